@@ -1,0 +1,12 @@
+# Compiles every public header alone, so that none needs another one to be included before it.
+function(kdd_headers_compile_alone target)
+  set(sources "")
+  foreach(header IN LISTS ARGN)
+    string(MAKE_C_IDENTIFIER "${header}" name)
+    set(source "${CMAKE_CURRENT_BINARY_DIR}/headers/${name}.cpp")
+    file(CONFIGURE OUTPUT "${source}" CONTENT "#include \"${header}\"\n#include \"${header}\"\n" @ONLY)
+    list(APPEND sources "${source}")
+  endforeach()
+  add_library(${target}_headers OBJECT ${sources})
+  target_link_libraries(${target}_headers PRIVATE kdd_options ${target})
+endfunction()

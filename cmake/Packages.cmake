@@ -1,0 +1,10 @@
+# What the library stands on; the Debian packages are listed in packages.txt.
+find_package(DCMTK CONFIG REQUIRED)
+find_package(Qt5 REQUIRED COMPONENTS Core)
+find_package(LibLZMA REQUIRED)
+find_package(Boost REQUIRED)
+find_package(spdlog REQUIRED)
+find_package(CLI11 REQUIRED)
+find_package(Threads REQUIRED)
+find_package(PkgConfig REQUIRED)
+pkg_check_modules(LIBDEFLATE REQUIRED IMPORTED_TARGET libdeflate)

@@ -1,0 +1,145 @@
+#include "platform/base/KxMsg.h"
+
+#include <QtEndian>
+
+namespace Kdd
+{
+
+template <typename T>
+KxMsg& KxMsg::put(T value)
+{
+    const T little = qToLittleEndian(value);
+    mBytes.append(reinterpret_cast<const char*>(&little), static_cast<int>(sizeof little));
+    return *this;
+}
+
+template <typename T>
+KxMsg& KxMsg::take(T& value)
+{
+    value = T();
+    if (!has(static_cast<qint64>(sizeof value)))
+        return *this;
+    value = qFromLittleEndian<T>(mBytes.constData() + mRead);
+    mRead += static_cast<int>(sizeof value);
+    return *this;
+}
+
+bool KxMsg::has(qint64 count)
+{
+    if (!mFailed && count >= 0 && count <= remaining())
+        return true;
+    mFailed = true;
+    return false;
+}
+
+KxMsg& KxMsg::operator<<(quint8 value)
+{
+    return put(value);
+}
+
+KxMsg& KxMsg::operator<<(quint16 value)
+{
+    return put(value);
+}
+
+KxMsg& KxMsg::operator<<(qint32 value)
+{
+    return put(value);
+}
+
+KxMsg& KxMsg::operator<<(quint32 value)
+{
+    return put(value);
+}
+
+KxMsg& KxMsg::operator<<(float value)
+{
+    return put(value);
+}
+
+KxMsg& KxMsg::operator<<(const Vec3i& value)
+{
+    return *this << value.x << value.y << value.z;
+}
+
+KxMsg& KxMsg::operator<<(const Box3f& value)
+{
+    return *this << value.xmin << value.xmax << value.ymin << value.ymax << value.zmin << value.zmax;
+}
+
+KxMsg& KxMsg::operator<<(const Mat4f& value)
+{
+    for (const float cell : value.m)
+        *this << cell;
+    return *this;
+}
+
+KxMsg& KxMsg::operator>>(quint8& value)
+{
+    return take(value);
+}
+
+KxMsg& KxMsg::operator>>(quint16& value)
+{
+    return take(value);
+}
+
+KxMsg& KxMsg::operator>>(qint32& value)
+{
+    return take(value);
+}
+
+KxMsg& KxMsg::operator>>(quint32& value)
+{
+    return take(value);
+}
+
+KxMsg& KxMsg::operator>>(float& value)
+{
+    return take(value);
+}
+
+KxMsg& KxMsg::operator>>(Vec3i& value)
+{
+    return *this >> value.x >> value.y >> value.z;
+}
+
+KxMsg& KxMsg::operator>>(Box3f& value)
+{
+    return *this >> value.xmin >> value.xmax >> value.ymin >> value.ymax >> value.zmin >> value.zmax;
+}
+
+KxMsg& KxMsg::operator>>(Mat4f& value)
+{
+    for (float& cell : value.m)
+        *this >> cell;
+    return *this;
+}
+
+QByteArray KxMsg::read(qint64 count)
+{
+    if (!has(count))
+        return {};
+    const QByteArray taken(mBytes.constData() + mRead, static_cast<int>(count));
+    mRead += static_cast<int>(count);
+    return taken;
+}
+
+KxMsg KxMsg::readMessage(qint64 count)
+{
+    if (!has(count)) {
+        KxMsg failed;
+        failed.setFailed();
+        return failed;
+    }
+    KxMsg part(QByteArray::fromRawData(mBytes.constData() + mRead, static_cast<int>(count)));
+    mRead += static_cast<int>(count);
+    return part;
+}
+
+void KxMsg::reset()
+{
+    *this = KxMsg();
+}
+
+}  // namespace Kdd

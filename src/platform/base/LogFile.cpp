@@ -1,0 +1,208 @@
+#include "platform/base/LogFile.h"
+
+#include <spdlog/sinks/rotating_file_sink.h>
+#include <spdlog/sinks/stdout_color_sinks.h>
+#include <spdlog/spdlog.h>
+
+#include <cstdarg>
+#include <cstdio>
+#include <cstdlib>
+#include <memory>
+#include <mutex>
+#include <vector>
+
+namespace Kdd
+{
+
+namespace
+{
+
+constexpr std::size_t kRotatedSize = 10 * 1024 * 1024;
+constexpr std::size_t kRotatedFiles = 3;
+
+struct Settings
+{
+    LogFile::Level level = LogFile::Level::Information;
+    LogFile::Severity least = LogFile::Severity::Trace;
+    LogFile::Callback callback;
+};
+
+Settings& settings()
+{
+    static Settings instance;
+    return instance;
+}
+
+/// The level at which a severity begins to be written.
+LogFile::Level neededLevel(LogFile::Severity severity)
+{
+    switch (severity) {
+    case LogFile::Severity::Error:
+        return LogFile::Level::Errors;
+    case LogFile::Severity::Warning:
+        return LogFile::Level::Warnings;
+    case LogFile::Severity::Information:
+        return LogFile::Level::Information;
+    case LogFile::Severity::Trace:
+        break;
+    }
+    return LogFile::Level::Everything;
+}
+
+LogFile::Severity severityOfTrace(int level)
+{
+    switch (level) {
+    case 3:
+        return LogFile::Severity::Error;
+    case 2:
+        return LogFile::Severity::Warning;
+    case 1:
+        return LogFile::Severity::Information;
+    default:
+        return LogFile::Severity::Trace;
+    }
+}
+
+spdlog::level::level_enum spdlogLevel(LogFile::Severity severity)
+{
+    switch (severity) {
+    case LogFile::Severity::Error:
+        return spdlog::level::err;
+    case LogFile::Severity::Warning:
+        return spdlog::level::warn;
+    case LogFile::Severity::Information:
+        return spdlog::level::info;
+    case LogFile::Severity::Trace:
+        break;
+    }
+    return spdlog::level::trace;
+}
+
+/// Made when the first line is written, so that a process which logs nothing does not pay for it.
+spdlog::logger& logger()
+{
+    static const std::shared_ptr<spdlog::logger> instance = [] {
+        std::vector<spdlog::sink_ptr> sinks{std::make_shared<spdlog::sinks::stderr_color_sink_mt>()};
+        std::string fault;
+        if (const char* path = std::getenv("KDD_LOG_FILE"); path != nullptr && *path != '\0') {
+            try {
+                sinks.push_back(std::make_shared<spdlog::sinks::rotating_file_sink_mt>(path, kRotatedSize,
+                                                                                       kRotatedFiles));
+            } catch (const spdlog::spdlog_ex& failure) {
+                fault = failure.what();
+            }
+        }
+        auto made = std::make_shared<spdlog::logger>("kdd", sinks.begin(), sinks.end());
+        made->set_level(spdlog::level::trace);
+        made->set_pattern("%Y-%m-%d %H:%M:%S.%e %^%l%$ %v");
+        made->flush_on(spdlog::level::warn);
+        if (!fault.empty())
+            made->error("The log file cannot be written: {}", fault);
+        return made;
+    }();
+    return *instance;
+}
+
+std::string formatted(const char* format, va_list arguments)
+{
+    va_list again;
+    va_copy(again, arguments);
+    const int length = std::vsnprintf(nullptr, 0, format, arguments);
+    std::string text(length > 0 ? static_cast<std::size_t>(length) : 0, '\0');
+    if (length > 0)
+        std::vsnprintf(text.data(), text.size() + 1, format, again);
+    va_end(again);
+    return text;
+}
+
+std::string withoutControlCharacters(const std::string& text)
+{
+    static const char* const kDigits = "0123456789abcdef";
+    std::string clean;
+    clean.reserve(text.size());
+    for (const char c : text) {
+        const auto byte = static_cast<unsigned char>(c);
+        if (byte >= 0x20 && byte != 0x7f)
+            clean += c;
+        else
+            clean.append("\\x").append(1, kDigits[byte >> 4]).append(1, kDigits[byte & 15]);
+    }
+    return clean;
+}
+
+void write(LogFile::Severity severity, const char* category, const char* format, va_list arguments)
+{
+    const Settings& current = settings();
+    const bool toCallback = current.callback && severity >= current.least;
+    if (!toCallback && neededLevel(severity) > current.level)
+        return;
+    const std::string line = withoutControlCharacters(formatted(format, arguments));
+    if (toCallback)
+        current.callback(severity, category, line);
+    else if (*category != '\0')
+        logger().log(spdlogLevel(severity), "[{}] {}", category, line);
+    else
+        logger().log(spdlogLevel(severity), line);
+}
+
+}  // namespace
+
+void LogFile::errorf(const char* format, ...)
+{
+    va_list arguments;
+    va_start(arguments, format);
+    write(Severity::Error, "", format, arguments);
+    va_end(arguments);
+}
+
+void LogFile::warnf(const char* format, ...)
+{
+    va_list arguments;
+    va_start(arguments, format);
+    write(Severity::Warning, "", format, arguments);
+    va_end(arguments);
+}
+
+void LogFile::printf(const char* format, ...)
+{
+    va_list arguments;
+    va_start(arguments, format);
+    write(Severity::Information, "", format, arguments);
+    va_end(arguments);
+}
+
+void LogFile::tracef(int level, const char* category, const char* format, ...)
+{
+    va_list arguments;
+    va_start(arguments, format);
+    write(severityOfTrace(level), category, format, arguments);
+    va_end(arguments);
+}
+
+void LogFile::setLevel(Level level)
+{
+    settings().level = level;
+}
+
+LogFile::Level LogFile::level()
+{
+    return settings().level;
+}
+
+bool LogFile::debugLogging()
+{
+    return settings().level >= Level::Timing;
+}
+
+void LogFile::setCallback(Callback callback, Severity least)
+{
+    settings().callback = std::move(callback);
+    settings().least = least;
+}
+
+bool LogFile::hasCallback()
+{
+    return static_cast<bool>(settings().callback);
+}
+
+}  // namespace Kdd

@@ -1,0 +1,54 @@
+#pragma once
+
+#include "platform/base/Export.h"
+
+#include <functional>
+#include <string>
+
+namespace Kdd
+{
+
+/// The process-wide log.
+///
+/// Lines go to standard error, coloured by severity on a terminal; when the environment variable KDD_LOG_FILE names a
+/// file they go to that file as well, which is rotated at 10 MiB and kept three times. Control characters in a line
+/// (they come from damaged files) are written as \xNN, so that a value can never forge a line of its own.
+///
+/// Every function may be called on every thread. The settings are made once at start and are not locked.
+class KDD_EXPORT LogFile
+{
+public:
+    enum class Severity { Trace, Information, Warning, Error };
+
+    /// What is written: the severity named and all above it.
+    enum class Level { Nothing = 0, Errors = 1, Warnings = 2, Information = 3, Timing = 4, Everything = 5 };
+
+    /// Receives a line without time and line end. `category` is empty but for traces.
+    using Callback = std::function<void(Severity severity, const char* category, const std::string& line)>;
+
+    /// Something that the user asked for is not done.
+    static void errorf(const char* format, ...) __attribute__((format(printf, 1, 2)));
+
+    /// Done, but not as asked.
+    static void warnf(const char* format, ...) __attribute__((format(printf, 1, 2)));
+
+    /// What an operator wants to see.
+    static void printf(const char* format, ...) __attribute__((format(printf, 1, 2)));
+
+    /// For us. `level` ranks the line: 3 is written like an error, 2 like a warning, 1 like information and 0 only
+    /// when everything is written. `category` names the subsystem ("TagFile", "TagMerge", "kdd", ...).
+    static void tracef(int level, const char* category, const char* format, ...)
+        __attribute__((format(printf, 3, 4)));
+
+    static void setLevel(Level level);
+    static Level level();
+
+    /// True when lines that tell how long something took are wanted.
+    static bool debugLogging();
+
+    /// Hands every line of `least` and above to `callback` instead of writing it; an empty callback ends that.
+    static void setCallback(Callback callback, Severity least = Severity::Trace);
+    static bool hasCallback();
+};
+
+}  // namespace Kdd

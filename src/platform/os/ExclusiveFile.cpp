@@ -1,0 +1,119 @@
+#include "platform/os/ExclusiveFile.h"
+
+#include <QFile>
+
+#include <fcntl.h>
+#include <sys/file.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <chrono>
+#include <thread>
+
+namespace Kdd
+{
+namespace
+{
+
+int openDescriptor(const QByteArray& path, FileLock lock, IfAbsent ifAbsent)
+{
+    // An exclusive lock on a network mount needs a writable descriptor.
+    const int access = lock == FileLock::Shared ? O_RDONLY : O_RDWR;
+    const int creation = ifAbsent == IfAbsent::Create ? O_CREAT : 0;
+    int fd = -1;
+    do {
+        fd = ::open(path.constData(), access | creation | O_CLOEXEC, 0666);
+    } while (fd < 0 && errno == EINTR);
+    return fd;
+}
+
+/// 0, or the errno.
+int takeLock(int fd, FileLock lock)
+{
+    const int operation = lock == FileLock::Shared ? LOCK_SH : LOCK_EX;
+    while (::flock(fd, operation | LOCK_NB) != 0) {
+        if (errno != EINTR)
+            return errno;
+    }
+    return 0;
+}
+
+/// 0 while the descriptor is the file at `path`; ESTALE when that was deleted or replaced between opening and
+/// locking, so that the lock is on a file nobody else will find; another errno for any other fault.
+int checkIdentity(int fd, const QByteArray& path)
+{
+    struct stat opened = {};
+    struct stat named = {};
+    if (::fstat(fd, &opened) != 0)
+        return errno;
+    if (S_ISDIR(opened.st_mode))
+        return EISDIR;
+    if (::stat(path.constData(), &named) != 0)
+        return errno == ENOENT ? ESTALE : errno;
+    const bool same = opened.st_dev == named.st_dev && opened.st_ino == named.st_ino;
+    return same && opened.st_nlink > 0 ? 0 : ESTALE;
+}
+
+LockedOpenResult failure(int error)
+{
+    if (error == EWOULDBLOCK || error == ESTALE)
+        return {-1, OpenFailure::Locked, error};
+    return {-1, error == ENOENT ? OpenFailure::NotFound : OpenFailure::System, error};
+}
+
+LockedOpenResult tryOnce(const QByteArray& path, FileLock lock, IfAbsent ifAbsent)
+{
+    const int fd = openDescriptor(path, lock, ifAbsent);
+    if (fd < 0)
+        return failure(errno);
+    int error = takeLock(fd, lock);
+    if (error == 0)
+        error = checkIdentity(fd, path);
+    if (error == 0)
+        return {fd, OpenFailure::None, 0};
+    ::close(fd);
+    return failure(error);
+}
+
+}  // namespace
+
+LockedOpenResult openLocked(const QString& path, FileLock lock, IfAbsent ifAbsent, LockPolling polling)
+{
+    const QByteArray name = QFile::encodeName(path);
+    const int attempts = std::max(polling.attempts, 1);
+    for (int attempt = 1;; ++attempt) {
+        const LockedOpenResult result = tryOnce(name, lock, ifAbsent);
+        if (result.failure != OpenFailure::Locked || attempt == attempts)
+            return result;
+        // A deleted or replaced file is no reason to wait: its successor may be free at this moment.
+        if (result.systemError != ESTALE)
+            std::this_thread::sleep_for(std::chrono::milliseconds(polling.delayMs));
+    }
+}
+
+LockedOpenResult openLockedFile(QFile& file, const QString& path, FileLock lock, IfAbsent ifAbsent,
+                                LockPolling polling)
+{
+    const LockedOpenResult result = openLocked(path, lock, ifAbsent, polling);
+    if (!result)
+        return result;
+    const auto mode = lock == FileLock::Shared ? QIODevice::ReadOnly : QIODevice::ReadWrite;
+    if (file.open(result.fd, mode, QFileDevice::AutoCloseHandle))
+        return result;
+    ::close(result.fd);
+    return failure(EBUSY);
+}
+
+bool removeLocked(QFile& lockedFile, const QString& path)
+{
+    // Under the lock up to here: unlinking after the close could hit the file of whoever comes next.
+    const bool removed = ::unlink(QFile::encodeName(path).constData()) == 0 || errno == ENOENT;
+    const int error = errno;
+    lockedFile.close();
+    errno = error;
+    return removed;
+}
+
+}  // namespace Kdd
