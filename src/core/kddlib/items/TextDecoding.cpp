@@ -1,0 +1,172 @@
+#include "kddlib/items/TextDecoding.h"
+
+#include <QTextCodec>
+
+#include <dcmtk/config/osconfig.h>
+
+#include <dcmtk/dcmdata/dcspchrs.h>
+#include <dcmtk/dcmdata/dctk.h>
+
+namespace Kdd
+{
+
+namespace
+{
+
+constexpr char kEscape = '\x1b';
+
+// Code extensions end at the separators of values, components and component groups.
+const char* const kDelimiters = "\\^=";
+
+const char* const kUtf8CharacterSet = "ISO_IR 192";
+
+bool isAscii(const QByteArray& bytes)
+{
+    for (const char c : bytes) {
+        if (c == kEscape || static_cast<signed char>(c) < 0)
+            return false;
+    }
+    return true;
+}
+
+/// Decodes with one of Qt's codecs; false when bytes are left that it cannot explain.
+bool decodeWith(const char* codecName, const QByteArray& bytes, QString& text)
+{
+    const QTextCodec* codec = QTextCodec::codecForName(codecName);
+    if (codec == nullptr)
+        return false;
+    QTextCodec::ConverterState state(QTextCodec::IgnoreHeader);
+    text = codec->toUnicode(bytes.constData(), bytes.size(), &state);
+    return state.invalidChars == 0 && state.remainingChars == 0;
+}
+
+bool decodeByDeclaration(const QByteArray& bytes, const QByteArray& characterSet, QString& text)
+{
+    DcmSpecificCharacterSet converter;
+    OFString converted;
+    return converter.selectCharacterSet(characterSet.constData()).good() &&
+           converter.convertString(bytes.constData(), converted, kDelimiters).good() &&
+           decodeWith("UTF-8", QByteArray::fromStdString(converted), text);
+}
+
+/// Kanji come behind escape sequences, katakana as single bytes of JIS X 0201.
+bool decodeJapanese(const QByteArray& bytes, const QByteArray& characterSet, QString& text)
+{
+    if (bytes.contains(kEscape) && decodeWith("ISO-2022-JP", bytes, text))
+        return true;
+    return characterSet.contains("IR 13") && decodeWith("Shift_JIS", bytes, text);
+}
+
+QString decodePart(const QByteArray& bytes, const QByteArray& characterSet)
+{
+    QString text;
+    if (isAscii(bytes))
+        return QString::fromLatin1(bytes);
+    if (decodeByDeclaration(bytes, characterSet, text) || decodeJapanese(bytes, characterSet, text) ||
+        decodeWith("UTF-8", bytes, text))
+        return text;
+    return QString::fromLatin1(bytes);
+}
+
+bool isDelimiter(char c)
+{
+    return c == '\\' || c == '^' || c == '=';
+}
+
+/// ESC $ switches to a two-byte set, but for ESC $ ) whose characters have the high bit set.
+bool entersTwoByteSet(const QByteArray& bytes, int escape)
+{
+    return bytes.mid(escape + 1, 1) == "$" && bytes.mid(escape + 2, 1) != ")";
+}
+
+bool declaresCharacterSet(DcmItem& item, OFString& characterSet)
+{
+    return item.findAndGetOFStringArray(DCM_SpecificCharacterSet, characterSet).good() &&
+           !characterSet.empty();
+}
+
+/// Calls `visit` with every item of every sequence of `item`.
+template <typename Visit>
+void forItems(DcmItem& item, Visit visit)
+{
+    for (DcmObject* object = item.nextInContainer(nullptr); object != nullptr;
+         object = item.nextInContainer(object)) {
+        if (object->ident() != EVR_SQ)
+            continue;
+        auto& sequence = static_cast<DcmSequenceOfItems&>(*object);
+        for (DcmObject* below = sequence.nextInContainer(nullptr); below != nullptr;
+             below = sequence.nextInContainer(below))
+            visit(static_cast<DcmItem&>(*below));
+    }
+}
+
+bool itemsDeclareCharacterSets(DcmItem& item)
+{
+    bool found = false;
+    forItems(item, [&](DcmItem& below) {
+        found = found || below.tagExists(DCM_SpecificCharacterSet) || itemsDeclareCharacterSets(below);
+    });
+    return found;
+}
+
+void convertElement(DcmElement& element, const QByteArray& characterSet)
+{
+    char* text = nullptr;
+    if (!DcmVR(element.getVR()).isaString() || element.getString(text).bad() || text == nullptr)
+        return;
+    const QByteArray bytes(text);
+    if (!isAscii(bytes))
+        element.putString(decodeText(bytes, characterSet).toUtf8().constData());
+}
+
+/// Value by value, so that one that does not fit leaves the others right.
+void convertItem(DcmItem& item, const OFString& inherited)
+{
+    OFString characterSet;
+    const bool declares = declaresCharacterSet(item, characterSet);
+    if (!declares)
+        characterSet = inherited;
+    for (DcmObject* object = item.nextInContainer(nullptr); object != nullptr;
+         object = item.nextInContainer(object)) {
+        if (object->ident() != EVR_SQ)
+            convertElement(static_cast<DcmElement&>(*object), QByteArray::fromStdString(characterSet));
+    }
+    forItems(item, [&](DcmItem& below) { convertItem(below, characterSet); });
+    if (declares)
+        item.putAndInsertString(DCM_SpecificCharacterSet, kUtf8CharacterSet);
+}
+
+}  // namespace
+
+QString decodeText(const QByteArray& bytes, const QByteArray& characterSet)
+{
+    if (isAscii(bytes))
+        return QString::fromLatin1(bytes);
+    QString text;
+    int start = 0;
+    bool isTwoByte = false;
+    for (int i = 0; i < bytes.size(); ++i) {
+        if (bytes.at(i) == kEscape)
+            isTwoByte = entersTwoByteSet(bytes, i);
+        // Halves of two-byte characters look like delimiters.
+        if (isTwoByte || !isDelimiter(bytes.at(i)))
+            continue;
+        text += decodePart(bytes.mid(start, i - start), characterSet) + QLatin1Char(bytes.at(i));
+        start = i + 1;
+    }
+    return text + decodePart(bytes.mid(start), characterSet);
+}
+
+bool convertToUtf8(DcmItem& dataset)
+{
+    // DCMTK converts items by the character set of the whole dataset, whatever they declare.
+    return !itemsDeclareCharacterSets(dataset) && dataset.convertToUTF8().good();
+}
+
+void convertValuesToUtf8(DcmItem& dataset)
+{
+    convertItem(dataset, OFString());
+    dataset.putAndInsertString(DCM_SpecificCharacterSet, kUtf8CharacterSet);
+}
+
+}  // namespace Kdd

@@ -1,0 +1,26 @@
+#pragma once
+
+#include "platform/base/Export.h"
+
+#include <QByteArray>
+#include <QString>
+
+class DcmItem;
+
+namespace Kdd
+{
+
+/// A text in the character set that a value of Specific Character Set (0008,0005) declares. What the declared set
+/// cannot explain is taken for UTF-8 if it is that, else for Latin-1. Japanese code extensions are understood also
+/// where DCMTK's conversion library lacks them.
+KDD_EXPORT QString decodeText(const QByteArray& bytes, const QByteArray& characterSet);
+
+/// Converts a dataset to UTF-8 as a whole, declared character set included. False when that cannot be done: a text
+/// does not fit its character set, or items declare one of their own. The dataset may be half converted then.
+bool convertToUtf8(DcmItem& dataset);
+
+/// Converts every value on its own, as `decodeText` does, by the character set of its item. Values that are UTF-8
+/// already stay as they are.
+void convertValuesToUtf8(DcmItem& dataset);
+
+}  // namespace Kdd

@@ -1,0 +1,298 @@
+#include "kddlib/tagfile/TagFile.h"
+
+#include "kddlib/Limits.h"
+#include "kddlib/items/FileNaming.h"
+#include "kddlib/net/DicomFileReader.h"
+#include "kddlib/tagmodel/TagElement.h"
+#include "kddlib/tagmodel/TagMap.h"
+#include "platform/base/LogFile.h"
+#include "platform/base/Stopwatch.h"
+
+#include <dcmtk/dcmdata/dcdeftag.h>
+#include <dcmtk/dcmdata/dcfilefo.h>
+
+namespace Kdd
+{
+
+namespace
+{
+
+const DcmTagKey kFilePath(0x0006, 0x7100);
+const DcmTagKey kSuffix(0x0006, 0x7101);
+
+QByteArray textOf(const TagMap& map, const DcmTagKey& key)
+{
+    QByteArray text;
+    map.findAndGetString(key, text);
+    return text;
+}
+
+}  // namespace
+
+TagFile::CompressionMode TagFile::sCompressionMode = CompressionMode::Zlib;
+Vec2i TagFile::sPreviewSize = {256, 256};
+unsigned int TagFile::sDebugOptions = 0;
+QByteArray TagFile::sMetaFolder;
+TagFile::Durability TagFile::sDurability = Durability::Process;
+
+TagFile::~TagFile()
+{
+    clear();
+}
+
+const char* TagFile::metaFolder()
+{
+    if (sMetaFolder.isEmpty())
+        setMetaFolder("");
+    return sMetaFolder.constData();
+}
+
+void TagFile::setMetaFolder(const char* path)
+{
+    sMetaFolder = QByteArray(path);
+    sMetaFolder.replace('\\', '/');
+    if (sMetaFolder.isEmpty())
+        sMetaFolder = ".";
+    if (!sMetaFolder.endsWith('/'))
+        sMetaFolder.append('/');
+    // A host that logs everything through a callback of its own would get the line before it is ready for lines.
+    if (LogFile::level() != LogFile::Level::Everything || !LogFile::hasCallback())
+        LogFile::printf("Meta folder set to %s", sMetaFolder.constData());
+}
+
+/// The name under which an image is indexed: its SOP Instance UID, and where it has none its file path.
+QByteArray TagFile::imageKey(const TagMap& image)
+{
+    const QByteArray sopUID = textOf(image, DCM_SOPInstanceUID);
+    return sopUID.isEmpty() ? textOf(image, kFilePath) : sopUID;
+}
+
+TagMap* TagFile::addTagMap(TagMap* map, const char* path, bool replace)
+{
+    std::unique_ptr<TagMap> image(map);
+    const QByteArray studyUID = textOf(*image, DCM_StudyInstanceUID);
+    const QByteArray seriesUID = textOf(*image, DCM_SeriesInstanceUID);
+    QByteArray key = imageKey(*image);
+    if (key.isEmpty() && path != nullptr)
+        key = path;
+    if (key.isEmpty() || (!mStudies.isEmpty() && mStudies.firstKey() != studyUID))
+        return nullptr;
+    if (TagMap* old = mImages.value(key, nullptr)) {
+        if (!replace)
+            return nullptr;
+        replaceImage(old);
+    }
+    mImages.insert(key, image.get());
+    placeInSeries(image.get(), seriesUID, studyUID);
+    if (path != nullptr)
+        image->putAndInsertValue(kSuffix, VrCode::LO, extractSuffix(path));
+    return image.release();
+}
+
+void TagFile::replaceImage(TagMap* old)
+{
+    TagMap* series = old->parent();
+    delete old;
+    if (series != nullptr && series->children().isEmpty())
+        dropSeries(series);
+}
+
+void TagFile::placeInSeries(TagMap* image, const QByteArray& seriesUID, const QByteArray& studyUID)
+{
+    if (TagMap* series = mSeries.value(seriesUID, nullptr)) {
+        series->addChildMap(image, TagMap::ImageLevel);
+        return;
+    }
+    auto* series = new TagMap;
+    mSeries.insert(seriesUID, series);
+    series->addChildMap(image, TagMap::ImageLevel);
+    std::shared_ptr<TagMap>& study = mStudies[studyUID];
+    if (study == nullptr)
+        study = std::make_shared<TagMap>();
+    study->addChildMap(series, TagMap::SeriesLevel);
+}
+
+TagMap* TagFile::addDataset(DcmDataset* dataset, const char* path, bool replace)
+{
+    return addTagMap(TagMap::createTagMap(dataset, kDefaultValueBound), path, replace);
+}
+
+TagMap* TagFile::addDicomFile(const char* file, const char* path, bool replace)
+{
+    DcmFileFormat format;
+    const OFCondition condition = readDicomFile(file, format);
+    if (condition.bad()) {
+        LogFile::errorf("Could not load %s: %s", file, condition.text());
+        return nullptr;
+    }
+    return addDataset(format.getDataset(), path, replace);
+}
+
+TagMap* TagFile::findSeries(const QByteArray& seriesUID) const
+{
+    return mSeries.value(seriesUID, nullptr);
+}
+
+TagMap* TagFile::findImage(const QByteArray& sopUID) const
+{
+    return mImages.value(sopUID, nullptr);
+}
+
+TagMap* TagFile::findImage(const QByteArray& sopUID, const QByteArray& suffix) const
+{
+    TagMap* image = findImage(sopUID);
+    if (image == nullptr || suffix.isEmpty())
+        return image;
+    const TagElement* held = image->findElement(kSuffix);
+    return held == nullptr || held->value() == suffix ? image : nullptr;
+}
+
+TagMap* TagFile::takeImage(const QByteArray& sopUID)
+{
+    TagMap* image = mImages.take(sopUID);
+    if (image == nullptr)
+        return nullptr;
+    TagMap* copy = image->clone();
+    delete image;
+    return copy;
+}
+
+int TagFile::removeImages(int count, const char** sopUIDs)
+{
+    int removed = 0;
+    for (int i = 0; i < count; ++i) {
+        TagMap* image = findImage(sopUIDs[i]);
+        TagMap* series = image != nullptr ? image->parent() : nullptr;
+        if (series == nullptr)
+            continue;
+        mImages.remove(sopUIDs[i]);
+        delete image;
+        ++removed;
+        TagMap* study = series->parent();
+        if (series->children().isEmpty() && study != nullptr) {
+            dropSeries(series);
+            dropStudyIfEmpty(study);
+        }
+    }
+    return removed;
+}
+
+int TagFile::removeSeries(int count, const char** seriesUIDs)
+{
+    int removed = 0;
+    for (int i = 0; i < count; ++i) {
+        TagMap* series = findSeries(seriesUIDs[i]);
+        if (series == nullptr)
+            continue;
+        for (const TagMap* image : series->children())
+            mImages.remove(imageKey(*image));
+        TagMap* study = series->parent();
+        dropSeries(series);
+        ++removed;
+        if (study != nullptr)
+            dropStudyIfEmpty(study);
+    }
+    return removed;
+}
+
+void TagFile::removeImagesWithoutFilename(TagMap* series)
+{
+    for (int i = series->children().size() - 1; i >= 0; --i) {
+        TagMap* image = series->children().at(i);
+        if (!image->tagsForLevel().contains(kFilePath))
+            dropImage(image);
+    }
+}
+
+void TagFile::dropImage(TagMap* image)
+{
+    mImages.remove(imageKey(*image));
+    delete image;
+}
+
+/// A node that is deleted takes itself out of its parent.
+void TagFile::dropSeries(TagMap* series)
+{
+    mSeries.remove(textOf(*series, DCM_SeriesInstanceUID));
+    delete series;
+}
+
+void TagFile::dropStudyIfEmpty(TagMap* study)
+{
+    if (study->children().isEmpty())
+        mStudies.remove(textOf(*study, DCM_StudyInstanceUID));
+}
+
+void TagFile::deleteEmptyNodes()
+{
+    for (auto it = mSeries.begin(); it != mSeries.end();) {
+        if (it.value()->children().isEmpty()) {
+            delete it.value();
+            it = mSeries.erase(it);
+        } else {
+            ++it;
+        }
+    }
+    for (auto it = mStudies.begin(); it != mStudies.end();) {
+        if (it.value()->children().isEmpty())
+            it = mStudies.erase(it);
+        else
+            ++it;
+    }
+}
+
+void TagFile::optimizeAll()
+{
+    if (debugOption(kMeasureUnoptimised))
+        mUnoptimisedSize = serialized(CompressionMode::None).size();
+    const Stopwatch stopwatch;
+    for (TagMap* series : qAsConst(mSeries))
+        series->optimizeAll();
+    for (const std::shared_ptr<TagMap>& study : qAsConst(mStudies))
+        study->optimizeAll();
+    deleteEmptyNodes();
+    mOptimiseMs = stopwatch.elapsed();
+}
+
+void TagFile::clear()
+{
+    mSeries.clear();
+    mImages.clear();
+    mStudies.clear();
+    mStoredSize = 0;
+    mUncompressedSize = 0;
+    mUnoptimisedSize = 0;
+    mBlobBytes = 0;
+    mOptimiseMs = 0;
+    mNumVolumes = 0;
+    mNumBlobs = 0;
+}
+
+QByteArray TagFile::studyInstanceUID() const
+{
+    return mStudies.isEmpty() ? QByteArray() : mStudies.firstKey();
+}
+
+std::shared_ptr<TagMap> TagFile::study() const
+{
+    return mStudies.isEmpty() ? nullptr : mStudies.first();
+}
+
+void TagFile::getStatistics(int& series, int& images, int& volumes, int& blobs, int& optimiseMs, int& readMs,
+                            int& writeMs, int& storedSize, int& uncompressedSize, int& unoptimisedSize,
+                            int& blobBytes) const
+{
+    series = mSeries.size();
+    images = mImages.size();
+    volumes = mNumVolumes;
+    blobs = mNumBlobs;
+    optimiseMs = mOptimiseMs;
+    readMs = mReadMs;
+    writeMs = mWriteMs;
+    storedSize = mStoredSize;
+    uncompressedSize = mUncompressedSize;
+    unoptimisedSize = mUnoptimisedSize;
+    blobBytes = mBlobBytes;
+}
+
+}  // namespace Kdd

@@ -1,0 +1,222 @@
+#pragma once
+
+#include "platform/base/Export.h"
+#include "platform/base/Geometry.h"
+
+#include <QByteArray>
+#include <QFile>
+#include <QMap>
+#include <QString>
+
+#include <memory>
+
+class DcmDataset;
+class QDataStream;
+
+namespace Kdd
+{
+
+class TagMap;
+enum class Flush;
+
+/// One study's metadata cache: the tree study, series, image of `TagMap`s with indexes by UID, and its file.
+///
+/// The object owns the study, the study its series, a series its images. The indexes only point into the tree. An
+/// image without SOP Instance UID, of which a few kinds of DICOM objects exist, is known by its file path instead.
+///
+/// One object is used by one thread at a time. Files are shared between processes: whoever changes one holds it
+/// exclusively open from before it is read until after it is written, and readers never see it half-written.
+/// Every write is first put into a journal beside the file ("<file>.journal"), so that a process that dies in the
+/// middle of it leaves nothing torn; whoever opens the file next finishes the write.
+class KDD_EXPORT TagFile
+{
+public:
+    enum class CompressionMode { None = 0, Zlib = 1, Lzma = 2 };
+
+    /// What a write must survive.
+    enum class Durability {
+        Process,    ///< the death of the process; the operating system writes to disk when it sees fit
+        PowerLoss,  ///< flushed to disk before the write returns
+    };
+
+    /// Bits of `setDebugOptions`.
+    static constexpr unsigned int kMeasureUnoptimised = 2;
+
+    TagFile() = default;
+    ~TagFile();
+    TagFile(const TagFile&) = delete;
+    TagFile& operator=(const TagFile&) = delete;
+
+    // ---- class-wide settings, made once at start and not locked
+
+    static CompressionMode compressionMode() { return sCompressionMode; }
+    static void setCompressionMode(CompressionMode mode) { sCompressionMode = mode; }
+
+    /// Width and height that previews fit into [pixels].
+    static Vec2i previewSize() { return sPreviewSize; }
+    static void setPreviewSize(const Vec2i& size) { sPreviewSize = size; }
+
+    static void setDebugOptions(unsigned int options) { sDebugOptions = options; }
+
+    /// Whether any of the bits is set.
+    static bool debugOption(unsigned int bits) { return (sDebugOptions & bits) != 0; }
+
+    /// The folder above all tag files; ends in "/".
+    static const char* metaFolder();
+    static void setMetaFolder(const char* path);
+
+    static void setDurability(Durability durability) { sDurability = durability; }
+
+    // ---- the tree
+
+    /// Places an image and takes it over. Null, and the map is deleted, when it belongs to another study than the one
+    /// held, when the image is there already and `replace` is false, or when it has neither SOP Instance UID nor path.
+    /// `path` may be null; it gives the image's file name suffix.
+    TagMap* addTagMap(TagMap* map, const char* path, bool replace);
+
+    /// The same for a dataset, which is only read.
+    TagMap* addDataset(DcmDataset* dataset, const char* path, bool replace);
+
+    /// The same for a DICOM file. A file that cannot be loaded is logged and gives null.
+    TagMap* addDicomFile(const char* file, const char* path, bool replace);
+
+    /// Owned by the tree; null when absent.
+    TagMap* findSeries(const QByteArray& seriesUID) const;
+    TagMap* findImage(const QByteArray& sopUID) const;
+
+    /// Null also when the image has another file name suffix; an empty suffix matches any.
+    TagMap* findImage(const QByteArray& sopUID, const QByteArray& suffix) const;
+
+    /// Takes the image out and gives a copy of all it showed, which the caller owns; null when absent. The series
+    /// stays, even without images.
+    TagMap* takeImage(const QByteArray& sopUID);
+
+    /// Remove what is found of `count` UIDs, series and studies that become empty too; the number removed.
+    int removeImages(int count, const char** sopUIDs);
+    int removeSeries(int count, const char** seriesUIDs);
+
+    /// Removes the images of a series that have no file path (0006,7100) of their own.
+    void removeImagesWithoutFilename(TagMap* series);
+
+    void deleteEmptyNodes();
+
+    /// Places every attribute where it costs the fewest bytes.
+    void optimizeAll();
+
+    void clear();
+    bool isEmpty() const { return mStudies.isEmpty(); }
+
+    /// Of the study held; empty when there is none.
+    QByteArray studyInstanceUID() const;
+    std::shared_ptr<TagMap> study() const;
+
+    const QMap<QByteArray, TagMap*>& seriesByUID() const { return mSeries; }
+    const QMap<QByteArray, TagMap*>& imagesByUID() const { return mImages; }
+
+    /// Counts of the present tree, and times [ms] and sizes [bytes] of its last optimisation, reading and writing.
+    void getStatistics(int& series, int& images, int& volumes, int& blobs, int& optimiseMs, int& readMs,
+                       int& writeMs, int& storedSize, int& uncompressedSize, int& unoptimisedSize,
+                       int& blobBytes) const;
+
+    // ---- the file
+
+    /// Where the study's file lies: two folder levels and a name made from the MD5 of the UID, under the meta folder.
+    static QString cacheFilePathForStudy(const char* studyUID);
+    QString cacheFilePath() const;
+
+    /// Reads the file at `path`; with `studyUID` not null only that study. With `keepOpen` the file is opened
+    /// exclusively and stays so until `writeCacheFile()` or `close()`; others that want it wait about two seconds.
+    bool readCacheFile(const QString& path, const char* studyUID, bool keepOpen);
+    bool readCacheFileForStudy(const char* studyUID, bool keepOpen);
+
+    /// Reads from a stream. The object is empty when false is returned.
+    bool readCacheFile(QDataStream& in, const char* studyUID);
+
+    /// Writes to the file held open, else to the study's own place. An empty object deletes the file held open.
+    /// False when not everything could be written; the file then keeps what it held.
+    bool writeCacheFile();
+    bool writeCacheFile(const char* path);
+
+    /// Writes to a stream; false only when the study is too large for the format.
+    bool writeCacheFile(QDataStream& out);
+
+    /// Brings the images held here into the study's file, in place of images with the same UID, while the file is
+    /// held exclusively open. The object then holds the whole study. On failure before the write the object keeps its
+    /// images; on failure of the write it holds the whole study, so that nothing is lost and the call can be repeated.
+    bool mergeIntoCacheFile();
+
+    /// Why the last read, write or merge failed, in words; empty after success.
+    const QString& failure() const { return mFailure; }
+
+    /// Whether it failed because others held the file all the time, so that trying again makes sense.
+    bool wasLockedOut() const { return mLockedOut; }
+
+    /// Closes the file held open; false if there is none.
+    bool close();
+
+private:
+    using StudyIndex = QMap<QByteArray, std::shared_ptr<TagMap>>;
+    using NodeIndex = QMap<QByteArray, TagMap*>;
+
+    struct Indexes
+    {
+        StudyIndex studies;
+        NodeIndex series;
+        NodeIndex images;
+    };
+
+    class BodyReader;
+
+    static QByteArray imageKey(const TagMap& image);
+    void replaceImage(TagMap* old);
+    void placeInSeries(TagMap* image, const QByteArray& seriesUID, const QByteArray& studyUID);
+    void dropSeries(TagMap* series);
+    void dropImage(TagMap* image);
+    void dropStudyIfEmpty(TagMap* study);
+
+    QByteArray serialized(CompressionMode mode);
+    void recordSizes(qint64 storedBody, qint64 body, const QList<QByteArray>& blobs);
+
+    bool fail(const QString& reason);
+    bool failReading(const char* reason);
+    bool failMerge(const QString& reason);
+
+    static Flush flushing();
+    bool openForReading(const QString& path, bool keepOpen);
+    bool openWhole(const QString& path);
+    bool createAndWrite(const QString& path);
+    bool writeInto(QFile& locked, const QString& path, bool cut);
+
+    void swapIndexes(Indexes& indexes);
+    bool openForMerge(QFile& file, const QString& path);
+    bool readForMerge(QFile& file, const QString& path, const QByteArray& studyUID);
+    void mergeFresh(const Indexes& fresh);
+    void copyImages(const TagMap& from, TagMap& to);
+    void mergeSeries(TagMap* series, const QByteArray& seriesUID, TagMap& freshStudy, TagMap& study);
+
+    StudyIndex mStudies;
+    NodeIndex mSeries;
+    NodeIndex mImages;
+    QFile mCacheFile;
+    QString mCacheFilePath;
+    QString mFailure;
+    bool mLockedOut = false;
+
+    int mStoredSize = 0;
+    int mUncompressedSize = 0;
+    int mUnoptimisedSize = 0;
+    int mBlobBytes = 0;
+    int mOptimiseMs = 0;
+    int mReadMs = 0;
+    int mWriteMs = 0;
+    int mNumVolumes = 0;
+    int mNumBlobs = 0;
+
+    static CompressionMode sCompressionMode;
+    static Vec2i sPreviewSize;
+    static unsigned int sDebugOptions;
+    static QByteArray sMetaFolder;
+    static Durability sDurability;
+};
+
+}  // namespace Kdd

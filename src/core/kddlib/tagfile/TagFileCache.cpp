@@ -1,0 +1,185 @@
+#include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagmodel/TagMap.h"
+#include "platform/base/LogFile.h"
+#include "platform/base/Stopwatch.h"
+#include "platform/os/ExclusiveFile.h"
+#include "platform/os/JournaledWrite.h"
+
+#include <QCryptographicHash>
+#include <QDataStream>
+#include <QDir>
+#include <QFileInfo>
+
+#include <cstring>
+
+namespace Kdd
+{
+
+namespace
+{
+
+constexpr LockPolling kReadPolling{20, 20};
+constexpr LockPolling kWritePolling{100, 20};
+
+QString systemText(int error)
+{
+    return QString::fromLocal8Bit(std::strerror(error));
+}
+
+}  // namespace
+
+QString TagFile::cacheFilePathForStudy(const char* studyUID)
+{
+    const QByteArray hash =
+        QCryptographicHash::hash(QByteArray(studyUID) + '\n', QCryptographicHash::Md5).toHex();
+    return QString::fromLocal8Bit(metaFolder()) +
+           QString::fromLatin1(hash.left(2) + '/' + hash.mid(2, 2) + '/' + hash.mid(4) + ".tc");
+}
+
+QString TagFile::cacheFilePath() const
+{
+    return cacheFilePathForStudy(studyInstanceUID().constData());
+}
+
+bool TagFile::readCacheFileForStudy(const char* studyUID, bool keepOpen)
+{
+    return readCacheFile(cacheFilePathForStudy(studyUID), studyUID, keepOpen);
+}
+
+bool TagFile::readCacheFile(const QString& path, const char* studyUID, bool keepOpen)
+{
+    const Stopwatch stopwatch;
+    if (mCacheFile.isOpen()) {
+        LogFile::warnf("Tag file already opened");
+        return fail(QStringLiteral("Tag file already opened"));
+    }
+    clear();
+    mFailure.clear();
+    mCacheFilePath = path;
+    if (!openForReading(path, keepOpen))
+        return false;
+    QDataStream in(&mCacheFile);
+    const bool isRead = readCacheFile(in, studyUID);
+    if (!isRead || !keepOpen)
+        mCacheFile.close();
+    mReadMs = stopwatch.elapsed();
+    if (!isRead)
+        LogFile::errorf("Could not read %s", qUtf8Printable(path));
+    else if (LogFile::debugLogging())
+        LogFile::printf("Cache file read in %d msec", mReadMs);
+    return isRead;
+}
+
+/// Opens the cache file, exclusively if it is to be kept open. A reader that meets the journal of a writer that died
+/// first finishes that write, for what the file holds may be torn.
+bool TagFile::openForReading(const QString& path, bool keepOpen)
+{
+    if (keepOpen)
+        return openWhole(path);
+    const LockedOpenResult opened =
+        openLockedFile(mCacheFile, path, FileLock::Shared, IfAbsent::Fail, kReadPolling);
+    mLockedOut = opened.failure == OpenFailure::Locked;
+    if (!opened) {
+        const QString reason = systemText(opened.systemError);
+        if (opened.failure != OpenFailure::NotFound || LogFile::debugLogging())
+            LogFile::warnf("Could not open %s: %s", qUtf8Printable(path), qUtf8Printable(reason));
+        return fail(reason);
+    }
+    if (!hasJournal(path))
+        return true;
+    mCacheFile.close();
+    return openWhole(path);
+}
+
+bool TagFile::openWhole(const QString& path)
+{
+    const LockedOpenResult opened =
+        openLockedFile(mCacheFile, path, FileLock::Exclusive, IfAbsent::Fail, kReadPolling);
+    mLockedOut = opened.failure == OpenFailure::Locked;
+    if (!opened)
+        return fail(systemText(opened.systemError));
+    const QString reason = recoverInterruptedWrite(mCacheFile, path, flushing());
+    if (reason.isEmpty())
+        return true;
+    mCacheFile.close();
+    LogFile::errorf("Could not finish the interrupted write of %s: %s", qUtf8Printable(path),
+                    qUtf8Printable(reason));
+    return fail(reason);
+}
+
+bool TagFile::writeCacheFile()
+{
+    mFailure.clear();
+    if (isEmpty()) {
+        if (!mCacheFile.isOpen())
+            return fail(QStringLiteral("No images to write"));
+        const QString reason = removeWithJournal(mCacheFile, mCacheFilePath);
+        return reason.isEmpty() || fail(reason);
+    }
+    if (!mCacheFile.isOpen())
+        return createAndWrite(cacheFilePath());
+    const bool isWritten = writeInto(mCacheFile, mCacheFilePath, false);
+    mCacheFile.close();
+    return isWritten;
+}
+
+bool TagFile::writeCacheFile(const char* path)
+{
+    mFailure.clear();
+    return createAndWrite(QString::fromLocal8Bit(path));
+}
+
+bool TagFile::createAndWrite(const QString& path)
+{
+    QDir().mkpath(QFileInfo(path).path());
+    QFile file;
+    const LockedOpenResult opened =
+        openLockedFile(file, path, FileLock::Exclusive, IfAbsent::Create, kWritePolling);
+    mLockedOut = opened.failure == OpenFailure::Locked;
+    if (!opened) {
+        LogFile::errorf("Could not open %s for writing", qUtf8Printable(path));
+        return fail(systemText(opened.systemError));
+    }
+    return writeInto(file, path, true);
+}
+
+/// Writes the whole object into a file that is held exclusively. An empty file that could not be filled is not left
+/// behind.
+bool TagFile::writeInto(QFile& locked, const QString& path, bool cut)
+{
+    const QByteArray content = serialized(sCompressionMode);
+    QString reason = mFailure;
+    if (!content.isEmpty())
+        reason = writeInPlace(locked, path, content, {flushing(), cut ? Tail::Cut : Tail::Keep});
+    if (!reason.isEmpty()) {
+        LogFile::errorf("Could not write %s: %s", qUtf8Printable(path), qUtf8Printable(reason));
+        if (locked.size() == 0 && !hasJournal(path))
+            removeLocked(locked, path);
+        return fail(reason);
+    }
+    mCacheFilePath = path;
+    if (LogFile::debugLogging())
+        LogFile::printf("Written tag file %s in %d msec", qUtf8Printable(path), mWriteMs);
+    return true;
+}
+
+Flush TagFile::flushing()
+{
+    return sDurability == Durability::PowerLoss ? Flush::Disk : Flush::Process;
+}
+
+bool TagFile::close()
+{
+    if (!mCacheFile.isOpen())
+        return false;
+    mCacheFile.close();
+    return true;
+}
+
+bool TagFile::fail(const QString& reason)
+{
+    mFailure = reason;
+    return false;
+}
+
+}  // namespace Kdd

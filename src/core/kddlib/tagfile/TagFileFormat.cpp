@@ -1,0 +1,348 @@
+#include "kddlib/Limits.h"
+#include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagmodel/TagElement.h"
+#include "kddlib/tagmodel/TagMap.h"
+#include "platform/base/KxMsg.h"
+#include "platform/base/LogFile.h"
+#include "platform/base/Stopwatch.h"
+#include "platform/compression/LzmaCompress.h"
+#include "platform/compression/QxCompress.h"
+
+#include <QDataStream>
+
+#include <dcmtk/dcmdata/dcdeftag.h>
+
+#include <cstring>
+#include <limits>
+
+namespace Kdd
+{
+
+namespace
+{
+
+constexpr char kMagic[] = {'T', 'a', 'C', 'a'};
+constexpr quint8 kVersion = 0;
+constexpr quint8 kOldLayout = 1;
+constexpr quint8 kLayout = 2;
+
+constexpr int kBodyReservation = 0x20000;
+constexpr int kReadChunk = 0x40000;
+constexpr qint64 kMaxStoredBody = kMaxBodySize + kReadChunk;  // data that cannot be compressed grows a little
+constexpr int kFrameSize = 16;                                // header, body size and blob count
+constexpr int kBlobFrameSize = 4;
+
+// What the records of a body hold.
+constexpr quint8 kStudyRecord = 0;
+constexpr quint8 kSeriesRecord = 1;
+constexpr quint8 kImageRecord = 2;
+constexpr quint8 kVolumesRecord = 3;
+
+const char* const kIncorrectHeader = "Tag file has incorrect header";
+const char* const kUnsupportedVersion = "Tag file has unsupported version";
+const char* const kTruncated = "Tag file seems to be truncated";
+const char* const kUnsupportedCompression = "Tag file has unsupported compression format";
+const char* const kDamaged = "Tag file has a damaged body";
+const char* const kNoStudy = "Tag file holds no readable study";
+const char* const kTooLarge = "Tag file would be larger than the format allows";
+
+struct Header
+{
+    char magic[4] = {};
+    quint8 version = 0;
+    quint8 reserved = 0;
+    quint8 layout = 0;
+    quint8 compression = 0;
+};
+
+/// At most `wanted` bytes. Memory grows with what really arrives: the wanted count may be a lie.
+QByteArray readAtMost(QDataStream& in, qint64 wanted)
+{
+    QByteArray bytes;
+    while (bytes.size() < wanted) {
+        const int had = bytes.size();
+        const int chunk = static_cast<int>(qMin<qint64>(kReadChunk, wanted - had));
+        bytes.resize(had + chunk);
+        const int got = in.readRawData(bytes.data() + had, chunk);
+        bytes.resize(had + qMax(0, got));
+        if (got < chunk)
+            break;
+    }
+    return bytes;
+}
+
+QList<QByteArray> readBlobs(QDataStream& in)
+{
+    qint32 count = 0;
+    in >> count;
+    QList<QByteArray> blobs;
+    for (qint32 i = 0; i < count && !in.atEnd(); ++i) {
+        QByteArray blob;
+        in >> blob;
+        if (in.status() != QDataStream::Ok)
+            break;
+        blobs.append(blob);
+    }
+    return blobs;
+}
+
+QByteArray compressed(const QByteArray& body, TagFile::CompressionMode mode)
+{
+    switch (mode) {
+    case TagFile::CompressionMode::Zlib:
+        return qxCompress(reinterpret_cast<const unsigned char*>(body.constData()), body.size());
+    case TagFile::CompressionMode::Lzma:
+        return lzmaCompress(body);
+    case TagFile::CompressionMode::None:
+        break;
+    }
+    return body;
+}
+
+/// False when the mode is none of ours; damage gives an empty body.
+bool uncompress(const QByteArray& stored, quint8 mode, QByteArray& body)
+{
+    switch (static_cast<TagFile::CompressionMode>(mode)) {
+    case TagFile::CompressionMode::None:
+        body = stored;
+        return true;
+    case TagFile::CompressionMode::Zlib:
+        body = qxUncompress(stored, kMaxBodySize);
+        return true;
+    case TagFile::CompressionMode::Lzma:
+        body = lzmaUncompress(stored, kMaxBodySize);
+        return true;
+    }
+    return false;
+}
+
+qint64 totalSize(const QList<QByteArray>& blobs)
+{
+    qint64 total = 0;
+    for (const QByteArray& blob : blobs)
+        total += blob.size();
+    return total;
+}
+
+int asInt(qint64 value)
+{
+    return static_cast<int>(qMin<qint64>(value, std::numeric_limits<int>::max()));
+}
+
+void writeNode(KxMsg& body, quint8 marker, const TagMap& node, QList<QByteArray>& blobs)
+{
+    body << marker;
+    node.serialize(body, blobs);
+}
+
+/// The records of a study's tree; the number of volumes written.
+int writeStudy(KxMsg& body, const TagMap& study, QList<QByteArray>& blobs)
+{
+    int volumes = 0;
+    writeNode(body, kStudyRecord, study, blobs);
+    for (const TagMap* series : study.children()) {
+        writeNode(body, kSeriesRecord, *series, blobs);
+        for (const TagMap* image : series->children())
+            writeNode(body, kImageRecord, *image, blobs);
+        if (series->volumes().isEmpty())
+            continue;
+        body << kVolumesRecord;
+        series->serializeVolumes(body, blobs);
+        volumes += series->volumes().size();
+    }
+    return volumes;
+}
+
+}  // namespace
+
+bool TagFile::writeCacheFile(QDataStream& out)
+{
+    const Stopwatch stopwatch;
+    KxMsg body;
+    body.reserve(kBodyReservation);
+    QList<QByteArray> blobs;
+    mNumVolumes = 0;
+    for (const std::shared_ptr<TagMap>& study : qAsConst(mStudies)) {
+        study->relinkItems();
+        mNumVolumes += writeStudy(body, *study, blobs);
+    }
+    if (body.size() > kMaxBodySize)
+        return fail(QLatin1String(kTooLarge));
+    const QByteArray stored = compressed(body.bytes(), sCompressionMode);
+    out.writeRawData(kMagic, sizeof kMagic);
+    out << kVersion << quint8(0) << kLayout << static_cast<quint8>(sCompressionMode);
+    out << static_cast<qint32>(stored.size());
+    out.writeRawData(stored.constData(), stored.size());
+    out << static_cast<qint32>(blobs.size());
+    for (const QByteArray& blob : qAsConst(blobs))
+        out << blob;
+    recordSizes(stored.size(), body.size(), blobs);
+    mWriteMs = stopwatch.elapsed();
+    return true;
+}
+
+void TagFile::recordSizes(qint64 storedBody, qint64 body, const QList<QByteArray>& blobs)
+{
+    const qint64 blobBytes = totalSize(blobs);
+    const qint64 around = kFrameSize + qint64(kBlobFrameSize) * blobs.size() + blobBytes;
+    mNumBlobs = blobs.size();
+    mBlobBytes = asInt(blobBytes);
+    mStoredSize = asInt(storedBody + around);
+    mUncompressedSize = asInt(body + around);
+}
+
+/// Puts the records of a body into the indexes and the tree of a tag file.
+class TagFile::BodyReader
+{
+public:
+    BodyReader(TagFile& file, const char* studyUID, const QList<QByteArray>& blobs)
+        : mFile(file)
+        , mWanted(studyUID)
+        , mContext{blobs, kMaxElements, 0}
+    {
+    }
+
+    /// False when the body is damaged.
+    bool read(KxMsg body)
+    {
+        while (body.remaining() > 0 && !body.failed()) {
+            quint8 marker = 0;
+            body >> marker;
+            const int length = TagMap::readLength(body);
+            KxMsg record = body.readMessage(length);
+            if (body.failed() || !take(marker, record))
+                return false;
+        }
+        return !body.failed();
+    }
+
+private:
+    bool take(quint8 marker, KxMsg& record)
+    {
+        switch (marker) {
+        case kStudyRecord:
+            return takeStudy(record);
+        case kSeriesRecord:
+            return mStudy == nullptr || takeSeries(record);
+        case kImageRecord:
+            return mSeries == nullptr || takeImage(record);
+        case kVolumesRecord:
+            return mSeries == nullptr || takeVolumes(record);
+        default:
+            return true;
+        }
+    }
+
+    /// Without a current study all that follows is passed over until the next one.
+    bool takeStudy(KxMsg& record)
+    {
+        mStudy = nullptr;
+        mSeries = nullptr;
+        if (!mFile.mStudies.isEmpty())
+            return true;
+        auto study = std::make_shared<TagMap>();
+        study->deserialize(record, nullptr, mContext);
+        QByteArray uid;
+        study->findAndGetString(DCM_StudyInstanceUID, uid);
+        if (record.failed() || (mWanted != nullptr && uid != mWanted))
+            return !record.failed();
+        mStudy = study.get();
+        mFile.mStudies.insert(uid, study);
+        return true;
+    }
+
+    bool takeSeries(KxMsg& record)
+    {
+        mSeries = readBelow(record, mStudy);
+        QByteArray uid;
+        mSeries->findAndGetString(DCM_SeriesInstanceUID, uid);
+        // Two series of one UID are no tree that was ever written.
+        if (record.failed() || mFile.mSeries.contains(uid))
+            return false;
+        mFile.mSeries.insert(uid, mSeries);
+        return true;
+    }
+
+    bool takeImage(KxMsg& record)
+    {
+        TagMap* image = readBelow(record, mSeries);
+        const QByteArray key = imageKey(*image);
+        delete mFile.mImages.value(key, nullptr);
+        mFile.mImages.insert(key, image);
+        return !record.failed();
+    }
+
+    bool takeVolumes(KxMsg& record)
+    {
+        mSeries->deserializeVolumes(record, mContext.blobs);
+        mFile.mNumVolumes += mSeries->volumes().size();
+        return !record.failed();
+    }
+
+    TagMap* readBelow(KxMsg& record, TagMap* parent)
+    {
+        auto* node = new TagMap;
+        node->mParent = parent;
+        parent->mChildren.append(node);
+        node->deserialize(record, parent, mContext);
+        return node;
+    }
+
+    TagFile& mFile;
+    const char* mWanted;
+    TagMap::RecordContext mContext;
+    TagMap* mStudy = nullptr;
+    TagMap* mSeries = nullptr;
+};
+
+bool TagFile::readCacheFile(QDataStream& in, const char* studyUID)
+{
+    clear();
+    Header header;
+    if (in.readRawData(header.magic, sizeof header.magic) != int(sizeof header.magic) ||
+        std::memcmp(header.magic, kMagic, sizeof kMagic) != 0)
+        return failReading(kIncorrectHeader);
+    in >> header.version >> header.reserved >> header.layout >> header.compression;
+    if (header.version != kVersion)
+        return failReading(kUnsupportedVersion);
+    QByteArray stored;
+    QList<QByteArray> blobs;
+    if (header.layout == kOldLayout) {
+        stored = readAtMost(in, kMaxStoredBody);
+    } else {
+        qint32 size = 0;
+        in >> size;
+        stored = readAtMost(in, qMin<qint64>(size, kMaxStoredBody));
+        if (in.status() != QDataStream::Ok || size < 0 || stored.size() < size)
+            return failReading(kTruncated);
+        blobs = readBlobs(in);
+    }
+    QByteArray body;
+    if (!uncompress(stored, header.compression, body))
+        return failReading(kUnsupportedCompression);
+    recordSizes(stored.size(), body.size(), blobs);
+    if (body.size() > kMaxBodySize || !BodyReader(*this, studyUID, blobs).read(KxMsg(body))) {
+        clear();
+        return failReading(kDamaged);
+    }
+    return !mStudies.isEmpty() || fail(QLatin1String(kNoStudy));
+}
+
+bool TagFile::failReading(const char* reason)
+{
+    LogFile::errorf("%s", reason);
+    return fail(QLatin1String(reason));
+}
+
+QByteArray TagFile::serialized(CompressionMode mode)
+{
+    const CompressionMode before = sCompressionMode;
+    sCompressionMode = mode;
+    QByteArray content;
+    QDataStream out(&content, QIODevice::WriteOnly);
+    const bool isWritten = writeCacheFile(out);
+    sCompressionMode = before;
+    return isWritten ? content : QByteArray();
+}
+
+}  // namespace Kdd

@@ -1,0 +1,143 @@
+#include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagmodel/TagMap.h"
+#include "platform/base/LogFile.h"
+#include "platform/os/ExclusiveFile.h"
+#include "platform/os/JournaledWrite.h"
+
+#include <QDataStream>
+#include <QDir>
+#include <QFileInfo>
+
+namespace Kdd
+{
+
+namespace
+{
+
+const char* const kCategory = "TagMerge";
+
+constexpr LockPolling kMergePolling{100, 20};
+
+}  // namespace
+
+bool TagFile::mergeIntoCacheFile()
+{
+    mFailure.clear();
+    mLockedOut = false;
+    if (isEmpty()) {
+        LogFile::tracef(2, kCategory, "No images, cannot update tag file");
+        return fail(QStringLiteral("No images, cannot update tag file"));
+    }
+    const QByteArray studyUID = studyInstanceUID();
+    const QString path = cacheFilePathForStudy(studyUID.constData());
+    QFile file;
+    if (!openForMerge(file, path))
+        return false;
+    if (file.size() == 0)
+        return writeInto(file, path, false);
+    Indexes fresh;
+    swapIndexes(fresh);
+    if (!readForMerge(file, path, studyUID)) {
+        swapIndexes(fresh);
+        return false;
+    }
+    mergeFresh(fresh);
+    return writeInto(file, path, false);
+}
+
+/// Opens the study's file exclusively, made with its folder when it is missing.
+bool TagFile::openForMerge(QFile& file, const QString& path)
+{
+    LockedOpenResult opened =
+        openLockedFile(file, path, FileLock::Exclusive, IfAbsent::Create, kMergePolling);
+    if (opened.failure == OpenFailure::NotFound) {
+        const QString folder = QFileInfo(path).path();
+        if (!QDir().mkpath(folder))
+            return failMerge(QString::asprintf("Could not create meta folder %s", qUtf8Printable(folder)));
+        opened = openLockedFile(file, path, FileLock::Exclusive, IfAbsent::Create, kMergePolling);
+    }
+    mLockedOut = opened.failure == OpenFailure::Locked;
+    if (!opened)
+        return failMerge(QString::asprintf("Could not open %s for read-write: error code %lu",
+                                           qUtf8Printable(path),
+                                           static_cast<unsigned long>(opened.systemError)));
+    const QString reason = recoverInterruptedWrite(file, path, flushing());
+    return reason.isEmpty() || failMerge(reason);
+}
+
+/// Reads the file into the object, which is left empty on failure.
+bool TagFile::readForMerge(QFile& file, const QString& path, const QByteArray& studyUID)
+{
+    QDataStream in(&file);
+    if (readCacheFile(in, studyUID.constData()))
+        return true;
+    // The reader passes other studies over; only reading without asking for one tells that there is another.
+    file.seek(0);
+    QDataStream again(&file);
+    const bool holdsAnother = readCacheFile(again, nullptr);
+    clear();
+    const QByteArray name = path.toLocal8Bit();
+    return failMerge(holdsAnother ? QString::asprintf("Tag file %s contains wrong study, expected %s",
+                                                      name.constData(), studyUID.constData())
+                                  : QString::asprintf("Could not read tag file %s", name.constData()));
+}
+
+void TagFile::mergeFresh(const Indexes& fresh)
+{
+    TagMap& study = *mStudies.first();
+    TagMap& freshStudy = *fresh.studies.first();
+    for (auto it = fresh.series.cbegin(); it != fresh.series.cend(); ++it)
+        mergeSeries(it.value(), it.key(), freshStudy, study);
+    deleteEmptyNodes();
+    for (const QByteArray& seriesUID : fresh.series.keys())
+        mSeries.value(seriesUID)->optimizeAll();
+    study.optimizeAll();
+}
+
+/// Joins a fresh series with the one of the same UID that the file holds. The fewer images are copied into the series
+/// of the more: a few images that arrive for a series of thousands cost little more than reading and writing the file.
+void TagFile::mergeSeries(TagMap* series, const QByteArray& seriesUID, TagMap& freshStudy, TagMap& study)
+{
+    for (TagMap* image : series->children())
+        delete mImages.take(imageKey(*image));
+    TagMap* old = mSeries.value(seriesUID, nullptr);
+    if (old != nullptr && old->children().size() > series->children().size()) {
+        copyImages(*series, *old);
+        return;
+    }
+    for (TagMap* image : series->children())
+        mImages.insert(imageKey(*image), image);
+    if (old != nullptr) {
+        copyImages(*old, *series);
+        delete old;
+    }
+    mSeries.insert(seriesUID, series);
+    series->copyFromParent();
+    series->detachItems();
+    freshStudy.removeChildMap(series);
+    study.addChildMap(series, TagMap::SeriesLevel);
+}
+
+void TagFile::copyImages(const TagMap& from, TagMap& to)
+{
+    for (const TagMap* image : from.children()) {
+        TagMap* copy = image->clone();
+        mImages.insert(imageKey(*copy), copy);
+        to.addChildMap(copy, TagMap::ImageLevel);
+    }
+}
+
+void TagFile::swapIndexes(Indexes& indexes)
+{
+    mStudies.swap(indexes.studies);
+    mSeries.swap(indexes.series);
+    mImages.swap(indexes.images);
+}
+
+bool TagFile::failMerge(const QString& reason)
+{
+    LogFile::tracef(3, kCategory, "%s", qUtf8Printable(reason));
+    return fail(reason);
+}
+
+}  // namespace Kdd

@@ -1,0 +1,185 @@
+#include "kddlib/Limits.h"
+#include "kddlib/tagmodel/TagMap.h"
+#include "kddlib/tagmodel/TagSequence.h"
+#include "platform/base/KxMsg.h"
+
+#include <memory>
+
+namespace Kdd
+{
+
+namespace
+{
+
+constexpr int kLengthEscape = 65535;
+constexpr int kShortLength = 2;
+
+const DcmTagKey kPreview(0x0006, 0x7105);
+const DcmTagKey kPreviewIndex(0x0006, 0x7106);
+
+/// Writes what `write` appends as a record behind its length. The record goes straight to its place; only one that
+/// outgrows the short length code is moved.
+template <typename Write>
+void writeRecord(KxMsg& out, Write write)
+{
+    const int start = out.position();
+    out << quint16(0);
+    write();
+    KxMsg length;
+    TagMap::writeLength(length, out.position() - start - kShortLength);
+    out.replace(start, kShortLength, length.bytes());
+}
+
+void writeKey(KxMsg& out, const DcmTagKey& key, VrCode vr)
+{
+    out << quint16(key.getGroup()) << quint16(key.getElement()) << static_cast<quint8>(vr);
+}
+
+void writeValue(KxMsg& out, const QByteArray& value)
+{
+    TagMap::writeLength(out, value.size());
+    out.write(value);
+}
+
+/// What follows in the record goes by the VR, so the VR has to go by what the element really is.
+VrCode storedVr(const TagElement& element)
+{
+    if (element.isSequence())
+        return VrCode::SQ;
+    return element.vr() == VrCode::SQ ? VrCode::UN : element.vr();
+}
+
+void writeElement(KxMsg& out, const DcmTagKey& key, const TagElement& element, QList<QByteArray>& blobs)
+{
+    if (key == kPreview && !element.markedAsMissing() && !element.markedAsOmitted()) {
+        writeKey(out, kPreviewIndex, VrCode::IS);
+        writeValue(out, QByteArray::number(blobs.size()));
+        blobs.append(element.value());
+        return;
+    }
+    writeKey(out, key, storedVr(element));
+    if (element.markedAsMissing() || element.markedAsOmitted())
+        return;
+    if (!element.isSequence()) {
+        writeValue(out, element.value());
+        return;
+    }
+    const auto& sequence = static_cast<const TagSequence&>(element);
+    TagMap::writeLength(out, sequence.numItems());
+    for (int i = 0; i < sequence.numItems(); ++i)
+        sequence.item(i)->serialize(out, blobs);
+}
+
+/// The preview that an index element stands for; null when the table has no such entry.
+std::unique_ptr<TagElement> previewOf(const QByteArray& index, const QList<QByteArray>& blobs)
+{
+    bool ok = false;
+    const int number = index.toInt(&ok, 10);
+    if (!ok || number < 0 || number >= blobs.size())
+        return nullptr;
+    return std::make_unique<TagElement>(VrCode::OB, blobs.at(number));
+}
+
+}  // namespace
+
+void TagMap::writeLength(KxMsg& out, int length)
+{
+    if (length < kLengthEscape)
+        out << static_cast<quint16>(length);
+    else
+        out << static_cast<quint16>(kLengthEscape) << static_cast<qint32>(length);
+}
+
+int TagMap::readLength(KxMsg& in)
+{
+    quint16 length = 0;
+    in >> length;
+    if (length < kLengthEscape)
+        return length;
+    qint32 longLength = 0;
+    in >> longLength;
+    return longLength;
+}
+
+void TagMap::serialize(KxMsg& out, QList<QByteArray>& blobs) const
+{
+    writeRecord(out, [&] {
+        for (auto it = mTags.cbegin(); it != mTags.cend(); ++it)
+            writeElement(out, it.key(), *it.value(), blobs);
+    });
+}
+
+void TagMap::deserialize(KxMsg& in, TagMap* parent, const QList<QByteArray>& blobs)
+{
+    RecordContext context{blobs, kMaxElements, 0};
+    deserialize(in, parent, context);
+}
+
+void TagMap::deserialize(KxMsg& in, TagMap* parent, RecordContext& context)
+{
+    // A node counts as well: an empty one takes two bytes of the file and many times that in memory.
+    if (--context.elementsLeft < 0)
+        in.setFailed();
+    while (in.remaining() > 0 && !in.failed()) {
+        if (--context.elementsLeft < 0) {
+            in.setFailed();
+            return;
+        }
+        quint16 group = 0;
+        quint16 number = 0;
+        quint8 code = 0;
+        in >> group >> number >> code;
+        DcmTagKey key(group, number);
+        const auto vr = static_cast<VrCode>(code);
+        std::unique_ptr<TagElement> element;
+        if (vr == VrCode::SQ) {
+            element = readSequence(in, key, parent, context);
+        } else if (vr == VrCode::Missing || vr == VrCode::Omitted) {
+            element = std::make_unique<TagElement>(vr, QByteArray());
+        } else {
+            const int length = readLength(in);
+            element = std::make_unique<TagElement>(vr, in.read(length));
+        }
+        if (key == kPreviewIndex && element != nullptr) {
+            element = previewOf(element->value(), context.blobs);
+            key = kPreview;
+        }
+        if (element != nullptr && !in.failed())
+            putInOrder(key, element.release());
+    }
+}
+
+std::unique_ptr<TagElement> TagMap::readSequence(KxMsg& in, const DcmTagKey& key, const TagMap* parent,
+                                                 RecordContext& context)
+{
+    const int count = readLength(in);
+    // Every item takes at least its own length code.
+    if (context.depth >= kMaxItemDepth || count < 0 || count > in.remaining() / kShortLength) {
+        in.setFailed();
+        return nullptr;
+    }
+    const TagElement* above = parent != nullptr ? parent->findElement(key) : nullptr;
+    const auto* sequenceAbove =
+        above != nullptr && above->isSequence() ? static_cast<const TagSequence*>(above) : nullptr;
+    auto sequence = std::make_unique<TagSequence>();
+    ++context.depth;
+    for (int i = 0; i < count && !in.failed(); ++i) {
+        TagMap* itemAbove =
+            sequenceAbove != nullptr && i < sequenceAbove->numItems() ? sequenceAbove->item(i) : nullptr;
+        auto* item = new TagMap;
+        sequence->addItem(item);
+        item->mIsSequenceItem = true;
+        const int length = readLength(in);
+        KxMsg record = in.readMessage(length);
+        item->deserialize(record, itemAbove, context);
+        if (record.failed())
+            in.setFailed();
+        item->mParent = itemAbove;
+        if (itemAbove != nullptr)
+            itemAbove->mChildren.append(item);
+    }
+    --context.depth;
+    return sequence;
+}
+
+}  // namespace Kdd

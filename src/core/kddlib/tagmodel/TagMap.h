@@ -1,0 +1,314 @@
+#pragma once
+
+#include "kddlib/tagmodel/VrCode.h"
+#include "platform/base/Export.h"
+
+#include <QByteArray>
+#include <QList>
+#include <QMap>
+
+#include <dcmtk/dcmdata/dctagkey.h>
+
+#include <memory>
+#include <string>
+
+class DcmElement;
+class DcmItem;
+class DcmObject;
+class DcmSequenceOfItems;
+class DcmTag;
+class QString;
+class QTextStream;
+
+namespace Kdd
+{
+
+class KxMsg;
+class TagElement;
+class TagSequence;
+class Volume;
+
+/// One node of a study's tree: the study, a series, an image, or an item of a sequence.
+///
+/// A node stores only what differs from its ancestors: what all images of a series share is held once by the series,
+/// and every image inherits it. Look-ups and iteration see the merged view of a node and its ancestors; an element
+/// marked missing hides an inherited value.
+///
+/// A node owns its elements, its volumes and, unless it is a sequence item, its children. An item belongs to its
+/// sequence; it may hang below the item of the same index in the same sequence of a node above and then inherits from
+/// it. An item whose parent item goes away first takes over all it inherited.
+///
+/// Maps made by the copy constructor or assignment share elements, children and volumes with their source without
+/// owning them and must not outlive it; `clone()` is the deep copy. Used by one thread at a time.
+class KDD_EXPORT TagMap
+{
+public:
+    /// The level of a child; levels 1 to 3 have a UID attribute that always stays in the child's own map.
+    enum Level {
+        ItemLevel = 0,    ///< sequence item, no UID
+        ImageLevel = 1,   ///< SOP Instance UID (0008,0018)
+        SeriesLevel = 2,  ///< Series Instance UID (0020,000E)
+        StudyLevel = 3,   ///< Study Instance UID (0020,000D)
+    };
+
+    using Tags = QMap<DcmTagKey, TagElement*>;
+
+    class iterator;
+
+    TagMap() = default;
+    TagMap(const TagMap& other);
+    TagMap& operator=(const TagMap& other);
+    ~TagMap();
+
+    // ---- the tree
+
+    TagMap* parent() const { return mParent; }
+    const QList<TagMap*>& children() const { return mChildren; }
+    bool isSequenceItem() const { return mIsSequenceItem; }
+
+    /// The node's own elements only. Whoever takes an element out owns it.
+    Tags& tagsForLevel() { return mTags; }
+    const Tags& tagsForLevel() const { return mTags; }
+
+    /// Attaches `child` and takes it over (an item stays with its sequence). What the child shares with this node is
+    /// dropped from the child, what it lacks is marked missing in it; a first child gives all it has to this node.
+    /// What every node shows stays the same. The UID element of `level` stays in the child.
+    void addChildMap(TagMap* child, Level level);
+
+    /// Takes the pointer out of the children; false if it is not there. The child is neither deleted nor changed: its
+    /// parent pointer stays and what it inherited is not copied back. The caller owns it.
+    bool removeChildMap(TagMap* child);
+
+    /// A deep copy of the merged view: no parent, no children, no volumes. The caller owns it.
+    TagMap* clone() const;
+
+    /// Makes every item of the own sequences stand alone: it takes over what it inherits and lets go of its parent.
+    /// To be called before a node leaves its tree.
+    void detachItems();
+
+    /// Makes every item below this node hang where a reader of the tag file will hang it: below the item of the same
+    /// index in the sequence that the node above shows under the same key. What every item shows stays the same.
+    void relinkItems();
+
+    // ---- from and to DICOM
+
+    /// A new map without parent of every attribute of the item; the caller owns it. Group lengths are left out. A
+    /// value longer than `maxLength` [bytes] is marked as omitted, with a larger bound for overlays, curves, look-up
+    /// tables and graphics; so are encapsulated pixel data and sequences nested deeper than `kMaxItemDepth`. A data
+    /// set's original transfer syntax, if it has one, becomes the one byte of (0006,7102).
+    static TagMap* createTagMap(DcmItem* item, unsigned int maxLength);
+
+    /// Copies one DCMTK element into the own map. Its value stays as it was when DCMTK cannot give it.
+    TagElement* setElement(DcmElement* element);
+
+    /// Copies one DCMTK sequence into the own map, in place of the items of an earlier one.
+    TagSequence* setSequence(DcmSequenceOfItems* sequence, unsigned int maxLength);
+
+    /// Inserts the merged view into a DCMTK item, without what is missing or omitted.
+    void insertInto(DcmItem& item) const;
+
+    // ---- look-up
+
+    /// The element that this node shows under the key; null when there is none or it is marked missing. Owned by the
+    /// node that holds it.
+    TagElement* findElement(const DcmTagKey& key) const;
+
+    /// As above; a tag with a private creator is looked up through it, any other by its base tag (repeating groups
+    /// such as (60xx,3000) folded).
+    TagElement* findElement(const DcmTag& tag) const;
+
+    /// `key` inside the sequence item named by a path such as "ReferencedSeriesSequence[1].(0008,1199)[0]"; an empty
+    /// path is this node. Null when a part of the path does not resolve or the index is out of range.
+    TagElement* findElement(const QString& path, const DcmTagKey& key) const;
+
+    /// The creator text of a private key's block, or null. Owned by the creator element.
+    const char* privateCreator(const DcmTagKey& key) const;
+
+    /// The first value as a number; false and 0 when there is none.
+    bool findAndGetInt(const DcmTagKey& key, int& value) const;
+
+    /// The value as text (`TagElement::getValueAsString`); false when nothing is found. Values of VR UN under a
+    /// private key are written by the VR that the dictionary has for their creator.
+    bool findAndGetString(const DcmTagKey& key, QByteArray& text) const;
+    bool findAndGetString(const DcmTagKey& key, const char* creator, QByteArray& text) const;
+
+    // ---- change; all of them work on the own map
+
+    /// Stores a number; its size decides the VR.
+    bool putAndInsertInt(const DcmTagKey& key, int value);
+
+    /// Stores a text in the encoding of the element's VR; a new element, or a marker, takes its VR from the
+    /// dictionary (UN when it knows none). Always true.
+    bool putAndInsertString(const DcmTagKey& key, const QByteArray& text);
+    bool putAndInsertString(const DcmTagKey& key, const char* creator, const QByteArray& text);
+
+    bool putAndInsertValue(const DcmTagKey& key, VrCode vr, const QByteArray& bytes);
+
+    /// Stores a private value in the creator's block, which is reserved when it is new. False for an even group and
+    /// when no block is free.
+    bool putAndInsertValue(const DcmTagKey& key, const char* creator, VrCode vr, const QByteArray& bytes);
+
+    /// Puts an element of its own under the key in place of an earlier one, and takes it over.
+    TagElement* putElement(const DcmTagKey& key, TagElement* element);
+
+    bool deleteElement(const DcmTagKey& key);
+    TagElement* markAsMissing(const DcmTagKey& key);
+    TagElement* markAsOmitted(const DcmTagKey& key);
+
+    // ---- the merged view in key order
+
+    iterator begin() const;
+    iterator end() const;
+
+    /// The first entry whose key is not less than `key`.
+    iterator lowerBound(const DcmTagKey& key) const;
+
+    // ---- placement between this node and its children
+
+    /// Moves one attribute to where it costs the tag file the fewest bytes; sequences stay where they are. What
+    /// every node shows stays the same.
+    void optimize(const DcmTagKey& key);
+
+    /// `optimize` for every key held here or by a child.
+    void optimizeAll();
+
+    /// Every child holds its own value, this node none.
+    void storeOptionA(const DcmTagKey& key);
+
+    /// This node holds the value, children only what differs. Children are compared by their bytes.
+    void storeOptionB(const DcmTagKey& key, VrCode vr, const QByteArray& value);
+
+    /// Deletes what clients never use (values of VR UN, look-up tables, overlays, all but four items of the Original
+    /// Attributes Sequence, the suffixes of volume files), here and below.
+    void removeTagsNotNeededByClient();
+
+    // ---- text and comparison
+
+    /// Compares the merged views. Unless `strict`, groups 0006 and 0071 and private values are passed over and VRs
+    /// may differ. The first difference ends it and is described in `diffs` if that is not null.
+    bool compare(const TagMap& other, bool strict, std::string* diffs) const;
+
+    /// Writes the merged view in the manner of a DICOM dump.
+    void dump(QTextStream& out, int indent) const;
+
+    /// Writes the node's own entries with lengths and attribute names; a missing marker shows as "--".
+    void listContent(QTextStream& out, int indent) const;
+
+    // ---- volumes
+
+    const QList<Volume*>& volumes() const { return mVolumes; }
+    void addBareVolume(Volume* volume);
+    void clearVolumes();
+
+    // ---- tag file records
+
+    /// Appends the node's own elements as one record with its length. Previews go to `blobs`.
+    void serialize(KxMsg& out, QList<QByteArray>& blobs) const;
+
+    /// Reads elements until the message is used up; `parent` is the node that this map will hang under. The message
+    /// has failed afterwards when it was damaged; the map then holds what was read before.
+    void deserialize(KxMsg& in, TagMap* parent, const QList<QByteArray>& blobs);
+
+    void serializeVolumes(KxMsg& out, QList<QByteArray>& blobs) const;
+    void deserializeVolumes(KxMsg& in, const QList<QByteArray>& blobs);
+
+    /// Lengths below 65535 take two bytes, others six.
+    static void writeLength(KxMsg& out, int length);
+    static int readLength(KxMsg& in);
+
+protected:
+    friend class TagFile;
+
+    void insertUID(Level level, TagElement* uid);
+    TagElement* removeUID(Level level);
+    TagElement* findElementPrivate(const DcmTagKey& key, const char* creator) const;
+
+    /// Gives this node a copy of every element of its parent's own map that it lacks.
+    void copyFromParent();
+
+private:
+    enum class Match { Bytes, BytesAndVr };
+
+    static TagMap* createTagMap(DcmItem* item, unsigned int maxLength, int depth);
+    TagSequence* setSequence(DcmSequenceOfItems* sequence, unsigned int maxLength, int depth);
+    void addObject(DcmObject& object, unsigned int maxLength, int depth);
+    void addSequence(DcmSequenceOfItems& sequence, unsigned int maxLength, int depth);
+    void addElement(DcmElement& element, unsigned int maxLength);
+
+    void adoptFrom(TagMap* child);
+    void dropWhatParentShows(const TagMap& parent);
+    static void attachItems(const TagSequence& parentSequence, const TagSequence& childSequence);
+    void standAlone();
+    void relinkOwnItems();
+    void hangBelow(TagMap* item);
+    void forgetParent();
+    void forgetInVolumes(const TagMap* image);
+    void forgetVolumeSuffixes();
+    void releaseAll();
+
+    TagElement* ownElement(const DcmTagKey& key) const { return mTags.value(key, nullptr); }
+    TagElement* plainElement(const DcmTagKey& key);
+    void putInOrder(const DcmTagKey& key, TagElement* element);
+
+    static bool equals(const TagElement& element, VrCode vr, const QByteArray& value, Match match);
+    void storeHere(const DcmTagKey& key, VrCode vr, const QByteArray& value, Match match);
+    class Survey;
+    void place(const DcmTagKey& key, Survey& survey);
+    void forgetUnseen(const DcmTagKey& key, bool childrenAreMarked);
+
+    /// What the reading of one tag file's records shares.
+    struct RecordContext
+    {
+        const QList<QByteArray>& blobs;
+        int elementsLeft;
+        int depth;
+    };
+
+    void deserialize(KxMsg& in, TagMap* parent, RecordContext& context);
+    std::unique_ptr<TagElement> readSequence(KxMsg& in, const DcmTagKey& key, const TagMap* parent,
+                                             RecordContext& context);
+
+    TagMap* mParent = nullptr;
+    QList<TagMap*> mChildren;
+    QList<Volume*> mVolumes;
+    Tags mTags;
+    bool mIsSequenceItem = false;
+    bool mOwns = true;
+};
+
+/// Walks the merged view of a node, its parent and its grandparent in key order, each key once with the nearest
+/// node's element, missing ones skipped. Valid until one of the three own maps changes.
+class KDD_EXPORT TagMap::iterator
+{
+public:
+    iterator() = default;
+
+    const DcmTagKey& key() const { return mLevels[mCurrent].at.key(); }
+    TagElement* value() const { return mLevels[mCurrent].at.value(); }
+    iterator& operator++();
+    bool operator==(const iterator& other) const;
+    bool operator!=(const iterator& other) const { return !(*this == other); }
+
+private:
+    friend class TagMap;
+
+    static constexpr int kLevels = 3;
+
+    struct Cursor
+    {
+        Tags::const_iterator at;
+        Tags::const_iterator end;
+        bool atEnd() const { return at == end; }
+    };
+
+    bool atEnd() const { return mCount == 0 || mLevels[mCurrent].atEnd(); }
+    void choose();
+    void step();
+    void skipMissing();
+
+    Cursor mLevels[kLevels];
+    int mCount = 0;
+    int mCurrent = 0;
+};
+
+}  // namespace Kdd

@@ -1,0 +1,198 @@
+#include "kddlib/Limits.h"
+#include "kddlib/tagmodel/TagMap.h"
+#include "kddlib/tagmodel/TagSequence.h"
+#include "platform/base/LogFile.h"
+
+#include <dcmtk/dcmdata/dcdatset.h>
+#include <dcmtk/dcmdata/dcdeftag.h>
+#include <dcmtk/dcmdata/dcelem.h>
+#include <dcmtk/dcmdata/dcpixel.h>
+#include <dcmtk/dcmdata/dcsequen.h>
+#include <dcmtk/dcmdata/dcxfer.h>
+
+#include <memory>
+
+namespace Kdd
+{
+
+namespace
+{
+
+const DcmTagKey kTransferSyntax(0x0006, 0x7102);
+
+bool isRepeatingGroup(const DcmTagKey& key, Uint16 first)
+{
+    return key.getGroup() >= first && key.getGroup() <= first + 0x1e && key.getElement() == 0x3000;
+}
+
+/// Attributes that viewers need whole whatever their length.
+bool hasLargeBound(const DcmTagKey& key)
+{
+    const int low = key.getElement() & 0xff;
+    switch (key.getGroup()) {
+    case 0x0018:
+        return key == DCM_FrameTimeVector;
+    case 0x0029:
+        return low == 0x00;
+    case 0x0070:
+        return key == DCM_GraphicData;
+    case 0x0071:
+        return low == 0x21 || low == 0x62 || low == 0x64;
+    default:
+        return isRepeatingGroup(key, 0x5000) || isRepeatingGroup(key, 0x6000);
+    }
+}
+
+bool isLookupTableSequence(const DcmTagKey& key)
+{
+    return key == DCM_VOILUTSequence || key == DCM_PresentationLUTSequence;
+}
+
+/// DCMTK gives encapsulated pixel data the length 0, and asking it for the value would read 4 GiB.
+bool isEncapsulated(DcmElement& element)
+{
+    if (element.ident() != EVR_PixelData)
+        return false;
+    E_TransferSyntax xfer = EXS_Unknown;
+    const DcmRepresentationParameter* parameter = nullptr;
+    static_cast<DcmPixelData&>(element).getOriginalRepresentationKey(xfer, parameter);
+    return DcmXfer(xfer).isEncapsulated() || element.getLengthField() == DCM_UndefinedLength;
+}
+
+/// Asking a text for its length loads it, so the length in the file is asked first.
+bool isLongerThan(DcmElement& element, unsigned int bound)
+{
+    return isEncapsulated(element) || element.getLengthField() > kLargeValueBound + 1 ||
+           element.getLength(EXS_LittleEndianImplicit, EET_UndefinedLength) > bound;
+}
+
+OFCondition copyText(DcmElement& element, QByteArray& value)
+{
+    char* text = nullptr;
+    const OFCondition condition = element.getString(text);
+    if (condition.good())
+        value = QByteArray(text);
+    return condition;
+}
+
+OFCondition copyBytes(DcmElement& element, QByteArray& value)
+{
+    const Uint32 length = element.getLengthField();
+    QByteArray bytes(static_cast<int>(length), Qt::Uninitialized);
+    OFCondition condition = EC_Normal;
+    if (length > 0)
+        condition = element.getPartialValue(bytes.data(), 0, length, nullptr, gLocalByteOrder);
+    if (condition.good())
+        value = bytes;
+    return condition;
+}
+
+OFCondition copyValue(DcmElement& element, TagElement& copy)
+{
+    copy.setVr(vrCodeOf(element.getVR()));
+    return isTextVr(copy.vr()) ? copyText(element, copy.value()) : copyBytes(element, copy.value());
+}
+
+}  // namespace
+
+TagMap* TagMap::createTagMap(DcmItem* item, unsigned int maxLength)
+{
+    return createTagMap(item, maxLength, 0);
+}
+
+TagMap* TagMap::createTagMap(DcmItem* item, unsigned int maxLength, int depth)
+{
+    auto map = std::make_unique<TagMap>();
+    for (DcmObject* object = item->nextInContainer(nullptr); object != nullptr;
+         object = item->nextInContainer(object))
+        map->addObject(*object, maxLength, depth);
+    if (item->ident() == EVR_dataset) {
+        const E_TransferSyntax xfer = static_cast<DcmDataset*>(item)->getOriginalXfer();
+        if (xfer != EXS_Unknown)
+            map->putAndInsertValue(kTransferSyntax, VrCode::OB, QByteArray(1, static_cast<char>(xfer)));
+    }
+    return map.release();
+}
+
+void TagMap::addObject(DcmObject& object, unsigned int maxLength, int depth)
+{
+    const DcmTagKey key = object.getTag();
+    if (key.getGroup() == 0 || key.getElement() == 0)
+        return;
+    if (object.ident() == EVR_SQ)
+        addSequence(static_cast<DcmSequenceOfItems&>(object), maxLength, depth);
+    else if (object.isLeaf())
+        addElement(static_cast<DcmElement&>(object), maxLength);
+}
+
+void TagMap::addSequence(DcmSequenceOfItems& sequence, unsigned int maxLength, int depth)
+{
+    const DcmTagKey key = sequence.getTag();
+    const bool isPrivate = (key.getGroup() & 1) != 0;
+    if (depth >= kMaxItemDepth) {
+        LogFile::warnf("Sequence (%04x,%04x) lies deeper than %d items and is left out",
+                       unsigned(key.getGroup()), unsigned(key.getElement()), kMaxItemDepth);
+        markAsOmitted(key);
+    } else if (isPrivate && sequence.getLength(EXS_LittleEndianImplicit, EET_UndefinedLength) > maxLength) {
+        markAsOmitted(key);
+    } else {
+        setSequence(&sequence, isLookupTableSequence(key) ? kLargeValueBound : maxLength, depth);
+    }
+}
+
+void TagMap::addElement(DcmElement& element, unsigned int maxLength)
+{
+    const DcmTagKey key = element.getTag();
+    auto copy = std::make_unique<TagElement>(VrCode::Omitted, QByteArray());
+    if (!isLongerThan(element, hasLargeBound(key) ? kLargeValueBound : maxLength)) {
+        const OFCondition condition = copyValue(element, *copy);
+        if (condition.bad()) {
+            // An empty value in its place would be a wrong one.
+            LogFile::warnf("Value of (%04x,%04x) cannot be read and is left out: %s",
+                           unsigned(key.getGroup()), unsigned(key.getElement()), condition.text());
+            copy = std::make_unique<TagElement>(VrCode::Omitted, QByteArray());
+        }
+    }
+    putInOrder(key, copy.release());
+}
+
+TagElement* TagMap::setElement(DcmElement* element)
+{
+    TagElement* copy = plainElement(element->getTag());
+    copyValue(*element, *copy);
+    return copy;
+}
+
+TagSequence* TagMap::setSequence(DcmSequenceOfItems* sequence, unsigned int maxLength)
+{
+    return setSequence(sequence, maxLength, 0);
+}
+
+TagSequence* TagMap::setSequence(DcmSequenceOfItems* sequence, unsigned int maxLength, int depth)
+{
+    auto copy = std::make_unique<TagSequence>();
+    // Stepping from item to item: looking items up by number would start at the head of DCMTK's list each time.
+    for (DcmObject* object = sequence->nextInContainer(nullptr); object != nullptr;
+         object = sequence->nextInContainer(object)) {
+        TagMap* map = createTagMap(static_cast<DcmItem*>(object), maxLength, depth + 1);
+        map->mIsSequenceItem = true;
+        copy->addItem(map);
+    }
+    TagSequence* put = copy.get();
+    putInOrder(sequence->getTag(), copy.release());
+    return put;
+}
+
+void TagMap::insertInto(DcmItem& item) const
+{
+    const iterator last = end();
+    for (iterator it = begin(); it != last; ++it) {
+        if (it.value()->markedAsOmitted())
+            continue;
+        std::unique_ptr<DcmElement> element(it.value()->createDcmElement(it.key()));
+        if (element != nullptr && item.insert(element.get()).good())
+            element.release();
+    }
+}
+
+}  // namespace Kdd

@@ -1,0 +1,288 @@
+#include "kddlib/tagmodel/TagMap.h"
+#include "kddlib/tagmodel/TagSequence.h"
+
+#include <dcmtk/dcmdata/dcdeftag.h>
+
+#include <cstring>
+#include <unordered_map>
+
+namespace Kdd
+{
+
+namespace
+{
+
+// What an attribute costs in the file: key, VR and length before the value; a marker has no length.
+constexpr qint64 kElementCost = 7;
+constexpr qint64 kMissingCost = 5;
+
+constexpr int kOriginalAttributesKept = 4;
+
+qint64 costOf(const TagElement& element)
+{
+    return element.value().size() + kElementCost;
+}
+
+struct HashOfValue
+{
+    std::size_t operator()(const TagElement* element) const
+    {
+        return qHash(element->value(), static_cast<uint>(element->vr()));
+    }
+};
+
+struct SameValue
+{
+    bool operator()(const TagElement* left, const TagElement* right) const
+    {
+        return left->vr() == right->vr() && left->value() == right->value();
+    }
+};
+
+/// By length, bytes and VR: of equally frequent values the first is the cheapest.
+bool comesFirst(const TagElement& left, const TagElement& right)
+{
+    const QByteArray& mine = left.value();
+    const QByteArray& theirs = right.value();
+    if (mine.size() != theirs.size())
+        return mine.size() < theirs.size();
+    const int order =
+        std::memcmp(mine.constData(), theirs.constData(), static_cast<std::size_t>(mine.size()));
+    return order != 0 ? order < 0 : left.vr() < right.vr();
+}
+
+}  // namespace
+
+/// What the children of a node see under one key, and what that costs where it stands now.
+class TagMap::Survey
+{
+public:
+    /// Counts what one child holds itself.
+    void add(const TagElement& own)
+    {
+        ++mHolders;
+        if (own.markedAsMissing()) {
+            ++mMissing;
+            mCurrent += kMissingCost;
+            return;
+        }
+        mCurrent += costOf(own);
+        mCosts[&own] += costOf(own);
+        mIsSequence = mIsSequence || own.vr() == VrCode::SQ;
+    }
+
+    /// Counts what the node shows, and the children that hold nothing and so see it.
+    void finish(const TagElement* shown, int children)
+    {
+        const int inheriting = children - mHolders;
+        if (shown == nullptr) {
+            mAbsent = mMissing + inheriting;
+            return;
+        }
+        mAbsent = mMissing;
+        mCurrent += costOf(*shown);
+        mIsSequence = mIsSequence || shown->vr() == VrCode::SQ;
+        if (inheriting > 0)
+            mCosts[shown] += inheriting * costOf(*shown);
+    }
+
+    bool isSequence() const { return mIsSequence; }
+    bool isMissing() const { return mMissing > 0; }
+    bool seesNothing() const { return mCosts.empty(); }
+
+    /// The value that costs the children most; there has to be one.
+    const TagElement& best() const
+    {
+        auto best = mCosts.cbegin();
+        for (auto it = mCosts.cbegin(); it != mCosts.cend(); ++it) {
+            if (it->second > best->second ||
+                (it->second == best->second && comesFirst(*it->first, *best->first)))
+                best = it;
+        }
+        return *best->first;
+    }
+
+    qint64 currentCost() const { return mCurrent; }
+
+    /// When every child holds its own value.
+    qint64 costBelow() const
+    {
+        qint64 total = 0;
+        for (const auto& entry : mCosts)
+            total += entry.second;
+        return total;
+    }
+
+    /// When the node holds `value` and children only what differs.
+    qint64 costWith(const TagElement& value) const
+    {
+        return costBelow() - mCosts.at(&value) + costOf(value) + kMissingCost * mAbsent;
+    }
+
+private:
+    std::unordered_map<const TagElement*, qint64, HashOfValue, SameValue> mCosts;  // children's cost by value
+    qint64 mCurrent = 0;
+    int mHolders = 0;
+    int mMissing = 0;
+    int mAbsent = 0;
+    bool mIsSequence = false;
+};
+
+namespace
+{
+
+bool isOverlayData(const DcmTagKey& key)
+{
+    return key.getGroup() >= 0x6000 && key.getGroup() <= 0x601e && key.getElement() == 0x3000;
+}
+
+bool isNeededByClient(const DcmTagKey& key, const TagElement& element)
+{
+    return element.vr() != VrCode::UN && key != DCM_VOILUTSequence && key != DCM_PresentationLUTSequence &&
+           key != DCM_ModalityLUTSequence && !isOverlayData(key);
+}
+
+quint32 packed(const DcmTagKey& key)
+{
+    return static_cast<quint32>(key.getGroup()) << 16 | key.getElement();
+}
+
+DcmTagKey unpacked(quint32 key)
+{
+    return {static_cast<Uint16>(key >> 16), static_cast<Uint16>(key & 0xffff)};
+}
+
+}  // namespace
+
+void TagMap::optimize(const DcmTagKey& key)
+{
+    if (mChildren.isEmpty())
+        return;
+    Survey survey;
+    for (const TagMap* child : qAsConst(mChildren)) {
+        if (const TagElement* own = child->ownElement(key))
+            survey.add(*own);
+    }
+    place(key, survey);
+}
+
+/// Keys do not influence each other, so one walk over the children surveys all of them: looking every key up in every
+/// child takes several times as long.
+void TagMap::optimizeAll()
+{
+    if (mChildren.isEmpty())
+        return;
+    std::unordered_map<quint32, Survey> surveys;
+    for (auto it = mTags.cbegin(); it != mTags.cend(); ++it)
+        surveys[packed(it.key())];
+    for (const TagMap* child : qAsConst(mChildren)) {
+        for (auto it = child->mTags.cbegin(); it != child->mTags.cend(); ++it)
+            surveys[packed(it.key())].add(*it.value());
+    }
+    for (auto& [key, survey] : surveys)
+        place(unpacked(key), survey);
+}
+
+void TagMap::place(const DcmTagKey& key, Survey& survey)
+{
+    survey.finish(findElement(key), mChildren.size());
+    if (survey.isSequence())
+        return;
+    if (survey.seesNothing()) {
+        forgetUnseen(key, survey.isMissing());
+        return;
+    }
+    const TagElement& best = survey.best();
+    const qint64 costHere = survey.costWith(best);
+    const qint64 costBelow = survey.costBelow();
+    if (costBelow < costHere && costBelow < survey.currentCost())
+        storeOptionA(key);
+    else if (costHere < survey.currentCost())
+        storeHere(key, best.vr(), QByteArray(best.value()), Match::BytesAndVr);
+}
+
+/// No child sees a value: at the root of the tree nothing needs to be hidden either.
+void TagMap::forgetUnseen(const DcmTagKey& key, bool childrenAreMarked)
+{
+    if (mParent != nullptr)
+        return;
+    deleteElement(key);
+    if (!childrenAreMarked)
+        return;
+    for (TagMap* child : qAsConst(mChildren))
+        child->deleteElement(key);
+}
+
+void TagMap::storeOptionA(const DcmTagKey& key)
+{
+    const TagElement* shown = findElement(key);
+    for (TagMap* child : qAsConst(mChildren)) {
+        const TagElement* own = child->ownElement(key);
+        if (own != nullptr && own->markedAsMissing())
+            child->deleteElement(key);
+        else if (own == nullptr && shown != nullptr)
+            child->putElement(key, shown->clone());
+    }
+    if (mParent == nullptr || mParent->findElement(key) == nullptr) {
+        deleteElement(key);
+        return;
+    }
+    if (TagElement* own = ownElement(key))
+        own->setVr(VrCode::Missing);
+    else
+        markAsMissing(key);
+}
+
+void TagMap::storeOptionB(const DcmTagKey& key, VrCode vr, const QByteArray& value)
+{
+    storeHere(key, vr, value, Match::Bytes);
+}
+
+/// Whether `element` may be dropped in favour of the value. With `BytesAndVr` a child never changes what it shows:
+/// the same two bytes are another number as US than as SS.
+bool TagMap::equals(const TagElement& element, VrCode vr, const QByteArray& value, Match match)
+{
+    if (element.value() != value)
+        return false;
+    // An omitted value has no bytes either, but it is not empty.
+    return match == Match::BytesAndVr || element.markedAsOmitted() || vr == VrCode::Omitted
+               ? element.vr() == vr
+               : true;
+}
+
+void TagMap::storeHere(const DcmTagKey& key, VrCode vr, const QByteArray& value, Match match)
+{
+    const TagElement* shown = findElement(key);
+    for (TagMap* child : qAsConst(mChildren)) {
+        const TagElement* own = child->ownElement(key);
+        if (own != nullptr) {
+            if (!own->markedAsMissing() && equals(*own, vr, value, match))
+                child->deleteElement(key);
+        } else if (shown == nullptr) {
+            child->markAsMissing(key);
+        } else if (!equals(*shown, vr, value, match)) {
+            child->putElement(key, shown->clone());
+        }
+    }
+    putAndInsertValue(key, vr, value);
+}
+
+void TagMap::removeTagsNotNeededByClient()
+{
+    for (auto it = mTags.begin(); it != mTags.end();) {
+        if (isNeededByClient(it.key(), *it.value())) {
+            ++it;
+        } else {
+            delete it.value();
+            it = mTags.erase(it);
+        }
+    }
+    TagElement* original = ownElement(DCM_OriginalAttributesSequence);
+    if (original != nullptr && original->isSequence())
+        static_cast<TagSequence*>(original)->truncate(kOriginalAttributesKept);
+    forgetVolumeSuffixes();
+    for (TagMap* child : qAsConst(mChildren))
+        child->removeTagsNotNeededByClient();
+}
+
+}  // namespace Kdd

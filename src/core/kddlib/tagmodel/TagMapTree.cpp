@@ -1,0 +1,265 @@
+#include "kddlib/tagmodel/TagMap.h"
+#include "kddlib/tagmodel/TagSequence.h"
+
+#include <dcmtk/dcmdata/dcdeftag.h>
+
+#include <memory>
+
+namespace Kdd
+{
+
+namespace
+{
+
+/// The attribute that names a node of the level; false when the level has none.
+bool uidKey(TagMap::Level level, DcmTagKey& key)
+{
+    switch (level) {
+    case TagMap::ImageLevel:
+        key = DCM_SOPInstanceUID;
+        return true;
+    case TagMap::SeriesLevel:
+        key = DCM_SeriesInstanceUID;
+        return true;
+    case TagMap::StudyLevel:
+        key = DCM_StudyInstanceUID;
+        return true;
+    case TagMap::ItemLevel:
+        break;
+    }
+    return false;
+}
+
+TagSequence* asSequence(TagElement* element)
+{
+    return element != nullptr && element->isSequence() ? static_cast<TagSequence*>(element) : nullptr;
+}
+
+}  // namespace
+
+TagMap::TagMap(const TagMap& other)
+    : mParent(other.mParent)
+    , mChildren(other.mChildren)
+    , mVolumes(other.mVolumes)
+    , mTags(other.mTags)
+    , mIsSequenceItem(other.mIsSequenceItem)
+    , mOwns(false)
+{
+}
+
+TagMap& TagMap::operator=(const TagMap& other)
+{
+    if (this == &other)
+        return *this;
+    if (mOwns)
+        releaseAll();
+    mParent = other.mParent;
+    mChildren = other.mChildren;
+    mVolumes = other.mVolumes;
+    mTags = other.mTags;
+    mIsSequenceItem = other.mIsSequenceItem;
+    mOwns = false;
+    return *this;
+}
+
+TagMap::~TagMap()
+{
+    if (mOwns)
+        releaseAll();
+}
+
+/// Children go before elements: their items hang below items of this node and would otherwise first copy all that
+/// they inherit, only to be deleted next.
+void TagMap::releaseAll()
+{
+    clearVolumes();
+    const QList<TagMap*> children = mChildren;
+    for (TagMap* child : children) {
+        if (mIsSequenceItem) {
+            child->standAlone();
+        } else {
+            child->mParent = nullptr;
+            delete child;
+        }
+    }
+    mChildren.clear();
+    qDeleteAll(mTags);
+    mTags.clear();
+    forgetParent();
+}
+
+/// In constant time for the first and the last child, so that taking all children away one by one is linear.
+void TagMap::forgetParent()
+{
+    if (mParent == nullptr)
+        return;
+    mParent->removeChildMap(this);
+    mParent = nullptr;
+}
+
+bool TagMap::removeChildMap(TagMap* child)
+{
+    if (mChildren.isEmpty())
+        return false;
+    forgetInVolumes(child);
+    if (mChildren.first() == child) {
+        mChildren.removeFirst();
+        return true;
+    }
+    if (mChildren.last() == child) {
+        mChildren.removeLast();
+        return true;
+    }
+    return mChildren.removeOne(child);
+}
+
+TagElement* TagMap::removeUID(Level level)
+{
+    DcmTagKey key;
+    return uidKey(level, key) ? mTags.take(key) : nullptr;
+}
+
+void TagMap::insertUID(Level level, TagElement* uid)
+{
+    DcmTagKey key;
+    if (uid != nullptr && uidKey(level, key))
+        putElement(key, uid);
+}
+
+void TagMap::addChildMap(TagMap* child, Level level)
+{
+    TagElement* uid = child->removeUID(level);
+    if (mChildren.isEmpty() && !mIsSequenceItem)
+        adoptFrom(child);
+    else
+        child->dropWhatParentShows(*this);
+    child->insertUID(level, uid);
+    mChildren.append(child);
+    child->mParent = this;
+}
+
+void TagMap::adoptFrom(TagMap* child)
+{
+    qDeleteAll(mTags);
+    mTags.clear();
+    mTags.swap(child->mTags);
+    // A series that has lost all its images still hangs below its study: without this step the new image would
+    // inherit whatever the study shows and the image lacks.
+    if (mParent != nullptr)
+        dropWhatParentShows(*mParent);
+}
+
+void TagMap::dropWhatParentShows(const TagMap& parent)
+{
+    auto own = mTags.begin();
+    const iterator end = parent.end();
+    for (iterator shown = parent.begin(); shown != end; ++shown) {
+        while (own != mTags.end() && own.key() < shown.key())
+            ++own;
+        if (own == mTags.end() || shown.key() < own.key()) {
+            own = mTags.insert(own, shown.key(), new TagElement(VrCode::Missing, QByteArray()));
+            ++own;
+            shown.value()->countMissing();
+        } else if (shown.value()->compare(*own.value(), true, nullptr)) {
+            delete own.value();
+            own = mTags.erase(own);
+        } else {
+            if (shown.value()->isSequence() && own.value()->isSequence())
+                attachItems(*asSequence(shown.value()), *asSequence(own.value()));
+            shown.value()->countDiffering();
+            ++own;
+        }
+    }
+}
+
+void TagMap::attachItems(const TagSequence& parentSequence, const TagSequence& childSequence)
+{
+    for (int i = 0; i < qMin(parentSequence.numItems(), childSequence.numItems()); ++i) {
+        childSequence.item(i)->standAlone();
+        parentSequence.item(i)->addChildMap(childSequence.item(i), ItemLevel);
+    }
+}
+
+TagMap* TagMap::clone() const
+{
+    auto copy = std::make_unique<TagMap>();
+    copy->mIsSequenceItem = mIsSequenceItem;
+    const iterator last = end();
+    for (iterator it = begin(); it != last; ++it)
+        copy->mTags.insert(copy->mTags.cend(), it.key(), it.value()->clone());
+    return copy.release();
+}
+
+void TagMap::copyFromParent()
+{
+    if (mParent == nullptr)
+        return;
+    const Tags& above = mParent->mTags;
+    for (auto it = above.cbegin(); it != above.cend(); ++it) {
+        if (!mTags.contains(it.key()))
+            mTags.insert(it.key(), it.value()->clone());
+    }
+}
+
+void TagMap::detachItems()
+{
+    for (TagElement* element : qAsConst(mTags)) {
+        const TagSequence* sequence = asSequence(element);
+        for (int i = 0; sequence != nullptr && i < sequence->numItems(); ++i)
+            sequence->item(i)->standAlone();
+    }
+}
+
+/// Takes over what this item inherits and lets go of its parent. Its nested items come first: they hang below items
+/// that this one sees only through its parent.
+void TagMap::standAlone()
+{
+    if (mParent == nullptr)
+        return;
+    detachItems();
+    Tags all;
+    const iterator last = end();
+    for (iterator it = begin(); it != last; ++it) {
+        const bool isOwn = ownElement(it.key()) == it.value();
+        all.insert(all.cend(), it.key(), isOwn ? it.value() : it.value()->clone());
+    }
+    for (TagElement* element : qAsConst(mTags)) {
+        if (element->markedAsMissing())
+            delete element;
+    }
+    mTags.swap(all);
+    forgetParent();
+}
+
+void TagMap::relinkItems()
+{
+    relinkOwnItems();
+    for (TagMap* child : qAsConst(mChildren))
+        child->relinkItems();
+}
+
+void TagMap::relinkOwnItems()
+{
+    for (auto it = mTags.cbegin(); it != mTags.cend(); ++it) {
+        const TagSequence* sequence = asSequence(it.value());
+        if (sequence == nullptr)
+            continue;
+        const TagSequence* above = mParent != nullptr ? asSequence(mParent->findElement(it.key())) : nullptr;
+        for (int i = 0; i < sequence->numItems(); ++i) {
+            TagMap* item = sequence->item(i);
+            item->hangBelow(above != nullptr && i < above->numItems() ? above->item(i) : nullptr);
+            item->relinkOwnItems();
+        }
+    }
+}
+
+void TagMap::hangBelow(TagMap* item)
+{
+    if (mParent == item)
+        return;
+    standAlone();
+    if (item != nullptr)
+        item->addChildMap(this, ItemLevel);
+}
+
+}  // namespace Kdd

@@ -1,0 +1,332 @@
+#include "kddlib/volumes/Volume.h"
+
+#include "kddlib/tagmodel/TagMap.h"
+#include "kddlib/volumes/RescaleSlopeCalculator.h"
+
+#include <QCryptographicHash>
+#include <QHash>
+
+#include <dcmtk/dcmdata/dcdeftag.h>
+
+#include <algorithm>
+#include <cstring>
+
+namespace Kdd
+{
+
+namespace
+{
+
+constexpr int kSixteenBitBuffer = 2;
+constexpr int kDefaultBitsStored = 8;
+constexpr int kMaxHistogramBins = 0x10000;
+constexpr quint64 kMaxHistogramTotal = quint64(1) << 32;
+
+const char* const kPart = "_part";
+
+QByteArray sopUIDOf(const TagMap& image)
+{
+    QByteArray uid;
+    image.findAndGetString(DCM_SOPInstanceUID, uid);
+    return uid;
+}
+
+struct SortedImage
+{
+    TagMap* image;
+    QByteArray sopUID;
+    int instanceNumber;
+    int position;  // in the vector given
+
+    bool operator<(const SortedImage& other) const
+    {
+        if (instanceNumber != other.instanceNumber)
+            return instanceNumber < other.instanceNumber;
+        return std::strcmp(sopUID.constData(), other.sopUID.constData()) < 0;
+    }
+};
+
+QVector<SortedImage> sorted(const QVector<TagMap*>& images)
+{
+    QVector<SortedImage> order;
+    order.reserve(images.size());
+    for (TagMap* image : images) {
+        SortedImage entry = {image, sopUIDOf(*image), 0, order.size()};
+        image->findAndGetInt(DCM_InstanceNumber, entry.instanceNumber);
+        order.append(entry);
+    }
+    std::stable_sort(order.begin(), order.end());
+    return order;
+}
+
+QVector<TagMap*> imagesOf(const QVector<SortedImage>& order)
+{
+    QVector<TagMap*> images;
+    images.reserve(order.size());
+    for (const SortedImage& entry : order)
+        images.append(entry.image);
+    return images;
+}
+
+/// The text before `position`; all of it when that is negative, the position of what is not found.
+QByteArray before(const QByteArray& text, int position)
+{
+    return position >= 0 ? text.left(position) : text;
+}
+
+/// The first value as a number; an empty attribute counts as absent.
+float floatOf(const TagMap& image, const DcmTagKey& key, float otherwise)
+{
+    QByteArray text;
+    image.findAndGetString(key, text);
+    const QByteArray first = before(text, text.indexOf('\\')).trimmed();
+    return first.isEmpty() ? otherwise : first.toFloat();
+}
+
+bool hasSignedPixels(const TagMap& image)
+{
+    int representation = 0;
+    return image.findAndGetInt(DCM_PixelRepresentation, representation) && representation == 1;
+}
+
+void addImage(RescaleSlopeCalculator& calculator, const TagMap& image)
+{
+    int bits = 0;
+    if (!image.findAndGetInt(DCM_BitsStored, bits))
+        bits = kDefaultBitsStored;
+    calculator.add(floatOf(image, DCM_RescaleSlope, 1), floatOf(image, DCM_RescaleIntercept, 0), bits,
+                   hasSignedPixels(image));
+}
+
+/// The number of a part without leading zeros; nothing is left of a number that is all zeros.
+QByteArray partNumber(const QByteArray& text)
+{
+    int start = 0;
+    while (start < text.size() && text.at(start) == '0')
+        ++start;
+    int end = start;
+    while (end < text.size() && text.at(end) >= '0' && text.at(end) <= '9')
+        ++end;
+    return text.mid(start, end - start);
+}
+
+void extendSign(boost::optional<qint32>& value)
+{
+    if (value)
+        value = static_cast<qint16>(*value);
+}
+
+}  // namespace
+
+SliceList SliceList::ofRun(Run run, int count)
+{
+    SliceList slices;
+    slices.mRun = count > 0 ? run : Run::None;
+    slices.mCount = count;
+    return slices;
+}
+
+SliceList::SliceList(const QVector<Slice>& slices)
+{
+    if (slices.isEmpty())
+        return;
+    const SliceList run = ofRun(slices.first().image == 0 ? Run::Ascending : Run::Descending, slices.size());
+    for (int i = 0; i < slices.size(); ++i) {
+        if (slices.at(i).image != run.at(i).image || slices.at(i).frame != 0) {
+            mListed = slices;
+            return;
+        }
+    }
+    *this = run;
+}
+
+Slice SliceList::at(int i) const
+{
+    switch (mRun) {
+    case Run::Ascending:
+        return {i, 0};
+    case Run::Descending:
+        return {mCount - 1 - i, 0};
+    case Run::None:
+        break;
+    }
+    return mListed.at(i);
+}
+
+TagMap* Volume::image(int i) const
+{
+    return mImages.value(i, nullptr);
+}
+
+TagMap* Volume::imageForSlice(int slice, int& frame) const
+{
+    if (slice < 0 || slice >= mSlices.size()) {
+        frame = -1;
+        return image(slice);
+    }
+    const Slice entry = mSlices.at(slice);
+    frame = entry.frame;
+    return image(entry.image);
+}
+
+std::vector<std::string> Volume::sopUIDList() const
+{
+    std::vector<std::string> identifiers;
+    identifiers.reserve(static_cast<std::size_t>(mImages.size()));
+    for (int i = 0; i < mSlices.size(); ++i) {
+        const Slice slice = mSlices.at(i);
+        const TagMap* holder = image(slice.image);
+        if (holder == nullptr)
+            continue;
+        QByteArray identifier = sopUIDOf(*holder);
+        if (isMultiFrame())
+            identifier += '.' + QByteArray::number(slice.frame);
+        identifiers.push_back(identifier.toStdString());
+    }
+    return identifiers;
+}
+
+QByteArray Volume::volumeHash() const
+{
+    if (!mVolumeHash.isEmpty())
+        return mVolumeHash;
+    QCryptographicHash hash(QCryptographicHash::Md5);
+    for (const std::string& identifier : sopUIDList())
+        hash.addData(identifier.data(), static_cast<int>(identifier.size()));
+    mVolumeHash = hash.result().toHex().toUpper();
+    return mVolumeHash;
+}
+
+void Volume::volumeHash(std::string& out) const
+{
+    out = volumeHash().toStdString();
+}
+
+void Volume::forgetImage(const TagMap* image)
+{
+    const auto at = std::find(mImages.begin(), mImages.end(), image);
+    if (at == mImages.end())
+        return;
+    const auto index = static_cast<qint32>(at - mImages.begin());
+    mImages.erase(at);
+    QVector<Slice> slices;
+    slices.reserve(mSlices.size());
+    for (int i = 0; i < mSlices.size(); ++i) {
+        Slice slice = mSlices.at(i);
+        if (slice.image >= index)
+            slice.image = slice.image == index ? -1 : slice.image - 1;
+        slices.append(slice);
+    }
+    setSlices(slices);
+}
+
+void Volume::setGeometry(const Vec3i& dims, const Box3f& box, const Mat4f& transformation)
+{
+    mDims = dims;
+    mBoundingBox = box;
+    mTransformation = transformation;
+}
+
+float Volume::rescaleSlope() const
+{
+    if (mRescaleSlope == 0)
+        initRescaleSlopeIntercept();
+    return mRescaleSlope;
+}
+
+float Volume::rescaleIntercept() const
+{
+    if (mRescaleSlope == 0)
+        initRescaleSlopeIntercept();
+    return mRescaleIntercept;
+}
+
+float Volume::precisionBitLoss() const
+{
+    if (mRescaleSlope == 0)
+        initRescaleSlopeIntercept();
+    return mPrecisionBitLoss;
+}
+
+void Volume::initRescaleSlopeIntercept() const
+{
+    RescaleSlopeCalculator calculator(kSixteenBitBuffer);
+    for (const TagMap* image : mImages)
+        addImage(calculator, *image);
+    mRescaleSlope = calculator.rescaleSlope();
+    mRescaleIntercept = calculator.rescaleIntercept();
+    mPrecisionBitLoss = calculator.precisionBitLoss();
+}
+
+void Volume::setRescale(float slope, float intercept, float precisionBitLoss)
+{
+    mRescaleSlope = slope;
+    mRescaleIntercept = intercept;
+    mPrecisionBitLoss = precisionBitLoss;
+}
+
+void Volume::setPadding(const boost::optional<qint32>& value, const boost::optional<qint32>& rangeLimit)
+{
+    mPaddingValue = value;
+    mPaddingRangeLimit = rangeLimit;
+}
+
+QByteArray Volume::fileNameSuffix(const char* fileName)
+{
+    const QByteArray name(fileName);
+    const QByteArray rest = name.mid(name.indexOf('-') + 1);
+    const int part = rest.indexOf(kPart);
+    if (part >= 0)
+        return rest.left(part + 1) + partNumber(rest.mid(part + static_cast<int>(std::strlen(kPart))));
+    return before(rest, rest.indexOf('.'));
+}
+
+void Volume::setImages(const QVector<TagMap*>& images, TagMap* single)
+{
+    if (!images.isEmpty()) {
+        mImages = imagesOf(sorted(images));
+        return;
+    }
+    if (single != nullptr)
+        mImages.append(single);
+}
+
+void Volume::setMultiFrameInfo(const std::vector<std::string>& frameIdentifiers)
+{
+    const QVector<SortedImage> order = sorted(mImages);
+    mImages = imagesOf(order);
+    QVector<Slice> slices;
+    if (frameIdentifiers.empty()) {
+        slices.resize(order.size());
+        for (int i = 0; i < order.size(); ++i)
+            slices[order.at(i).position].image = i;
+    }
+    QHash<QByteArray, int> indexes;
+    for (int i = 0; i < order.size(); ++i)
+        indexes.insert(order.at(i).sopUID, i);
+    for (const std::string& each : frameIdentifiers) {
+        const QByteArray identifier = QByteArray::fromStdString(each);
+        const int dot = identifier.lastIndexOf('.');
+        const int frame = dot >= 0 ? identifier.mid(dot + 1).toInt() : 0;
+        slices.append({indexes.value(before(identifier, dot), -1), frame});
+    }
+    setSlices(slices);
+}
+
+void Volume::attachImages(int volumeIndex, const QVector<TagMap*>& images)
+{
+    mVolumeIndex = volumeIndex;
+    setImages(images, nullptr);
+    if (mImages.isEmpty() || !hasSignedPixels(*mImages.first()))
+        return;
+    extendSign(mPaddingValue);
+    extendSign(mPaddingRangeLimit);
+}
+
+bool Volume::hasExtraData() const
+{
+    return !mFileNameSuffix.isEmpty() && mHistogram.numBins() < kMaxHistogramBins &&
+           mHistogram.total() < kMaxHistogramTotal;
+}
+
+}  // namespace Kdd

@@ -1,0 +1,71 @@
+#include "support/DatasetBuilder.h"
+
+#include "kddlib/tagmodel/TagMap.h"
+
+#include <stdexcept>
+
+namespace Kdd
+{
+
+DatasetBuilder::DatasetBuilder()
+    : mDataset(std::make_shared<DcmDataset>())
+{
+}
+
+DatasetBuilder::DatasetBuilder(const char* sopUID)
+    : DatasetBuilder()
+{
+    with(DCM_SOPClassUID, UID_SecondaryCaptureImageStorage);
+    with(DCM_SOPInstanceUID, sopUID);
+    with(DCM_StudyInstanceUID, "1.2");
+    with(DCM_SeriesInstanceUID, "1.2.3");
+}
+
+DatasetBuilder& DatasetBuilder::with(const DcmTag& tag, const char* value)
+{
+    if (mDataset->putAndInsertString(tag, value).bad())
+        throw std::invalid_argument("the test's value does not fit its attribute");
+    return *this;
+}
+
+DatasetBuilder& DatasetBuilder::withLong(const DcmTag& tag, int length)
+{
+    return with(tag, QByteArray(length, 'x').constData());
+}
+
+DatasetBuilder& DatasetBuilder::with(DcmElement* element)
+{
+    if (mDataset->insert(element, OFTrue).bad())
+        throw std::invalid_argument("the test's element cannot be inserted");
+    return *this;
+}
+
+DatasetBuilder& DatasetBuilder::withItem(const DcmTag& sequence, const DatasetBuilder& item)
+{
+    if (mDataset->insertSequenceItem(sequence, new DcmItem(*item.mDataset)).bad())
+        throw std::invalid_argument("the test's item cannot be inserted");
+    return *this;
+}
+
+DatasetBuilder& DatasetBuilder::without(const DcmTagKey& key)
+{
+    delete mDataset->remove(key);
+    return *this;
+}
+
+TagMap* DatasetBuilder::map(unsigned int maxLength) const
+{
+    return TagMap::createTagMap(mDataset.get(), maxLength);
+}
+
+DatasetBuilder anImage(const char* sopUID)
+{
+    return DatasetBuilder(sopUID);
+}
+
+DatasetBuilder anItem()
+{
+    return DatasetBuilder();
+}
+
+}  // namespace Kdd

@@ -1,0 +1,58 @@
+#pragma once
+
+#include <QByteArray>
+
+#include <dcmtk/config/osconfig.h>
+
+#include <dcmtk/dcmdata/dctk.h>
+
+#include <memory>
+
+namespace Kdd
+{
+
+class TagMap;
+
+/// Makes datasets for tests: `anImage("1.2.3").inSeries("1.2").with(DCM_PatientName, "Doe^J").build()`. What a test does
+/// not speak of has a default: one study, one series, secondary capture.
+class DatasetBuilder
+{
+public:
+    explicit DatasetBuilder(const char* sopUID);
+
+    DatasetBuilder& inStudy(const char* uid) { return with(DCM_StudyInstanceUID, uid); }
+    DatasetBuilder& inSeries(const char* uid) { return with(DCM_SeriesInstanceUID, uid); }
+
+    /// A text, or numbers as text for the binary VRs.
+    DatasetBuilder& with(const DcmTag& tag, const char* value);
+
+    /// A text of `length` characters.
+    DatasetBuilder& withLong(const DcmTag& tag, int length);
+
+    /// Takes the element over.
+    DatasetBuilder& with(DcmElement* element);
+
+    /// Appends an item to a sequence.
+    DatasetBuilder& withItem(const DcmTag& sequence, const DatasetBuilder& item);
+
+    DatasetBuilder& without(const DcmTagKey& key);
+
+    const DcmDataset& build() const { return *mDataset; }
+    DcmDataset& dataset() const { return *mDataset; }
+
+    /// What the cache makes of it; the caller owns the map.
+    TagMap* map(unsigned int maxLength = 1024) const;
+
+private:
+    friend DatasetBuilder anItem();
+    DatasetBuilder();
+
+    std::shared_ptr<DcmDataset> mDataset;
+};
+
+DatasetBuilder anImage(const char* sopUID = "1.2.3.1");
+
+/// Without any attribute, for sequences.
+DatasetBuilder anItem();
+
+}  // namespace Kdd

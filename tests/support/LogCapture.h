@@ -1,0 +1,27 @@
+#pragma once
+
+#include <string>
+#include <vector>
+
+namespace Kdd
+{
+
+/// Takes every log line while it lives, instead of its being written.
+class LogCapture
+{
+public:
+    LogCapture();
+    ~LogCapture();
+    LogCapture(const LogCapture&) = delete;
+    LogCapture& operator=(const LogCapture&) = delete;
+
+    const std::vector<std::string>& lines() const { return mLines; }
+
+    /// How many lines contain the text.
+    int count(const std::string& text) const;
+
+private:
+    std::vector<std::string> mLines;
+};
+
+}  // namespace Kdd
