@@ -1,0 +1,89 @@
+#include "tools/kdd/AttributeDiff.h"
+
+#include "kddlib/tagmodel/TagMap.h"
+#include "kddlib/tagmodel/TagSequence.h"
+#include "tools/kdd/AttributeText.h"
+
+namespace Kdd
+{
+
+namespace
+{
+
+using Report = std::function<void(const AttributeDifference&)>;
+
+QByteArray describe(const TagMap& node, const TagMap::iterator& it)
+{
+    const TagElement& element = *it.value();
+    if (element.isSequence())
+        return "SQ of " + QByteArray::number(static_cast<const TagSequence&>(element).numItems()) + " items";
+    if (element.markedAsOmitted())
+        return "omitted";
+    QByteArray text;
+    node.findAndGetString(it.key(), text);
+    return QByteArray(vrName(element.vr())) + " [" + text + ']';
+}
+
+class NodeComparison
+{
+public:
+    explicit NodeComparison(const Report& report)
+        : mReport(report)
+    {
+    }
+
+    void compare(const TagMap& left, const TagMap& right, const QByteArray& prefix)
+    {
+        const TagMap::iterator end = left.end();
+        TagMap::iterator mine = left.begin();
+        TagMap::iterator theirs = right.begin();
+        while (mine != end || theirs != end) {
+            const bool hasMine = mine != end && (theirs == end || mine.key() <= theirs.key());
+            const bool hasTheirs = theirs != end && (mine == end || theirs.key() <= mine.key());
+            const DcmTagKey key = hasMine ? mine.key() : theirs.key();
+            if (key.getGroup() != 0x0006)
+                entry(key, prefix, left, hasMine ? &mine : nullptr, right, hasTheirs ? &theirs : nullptr);
+            if (hasMine)
+                ++mine;
+            if (hasTheirs)
+                ++theirs;
+        }
+    }
+
+private:
+    void entry(const DcmTagKey& key, const QByteArray& prefix, const TagMap& left,
+               const TagMap::iterator* mine, const TagMap& right, const TagMap::iterator* theirs)
+    {
+        if (mine != nullptr && theirs != nullptr &&
+            !differ(*mine->value(), *theirs->value(), prefix + keyText(key)))
+            return;
+        const TagMap& named = mine != nullptr ? left : right;
+        mReport({prefix + keyText(key), keywordOf(named, key), mine != nullptr ? describe(left, *mine) : "-",
+                 theirs != nullptr ? describe(right, *theirs) : "-"});
+    }
+
+    /// Whether the two elements themselves differ; what differs inside of equally long sequences is reported there.
+    bool differ(const TagElement& mine, const TagElement& theirs, const QByteArray& path)
+    {
+        if (!mine.isSequence() || !theirs.isSequence())
+            return mine.isSequence() != theirs.isSequence() || !mine.compare(theirs, true, nullptr);
+        const auto& left = static_cast<const TagSequence&>(mine);
+        const auto& right = static_cast<const TagSequence&>(theirs);
+        if (left.numItems() != right.numItems())
+            return true;
+        for (int i = 0; i < left.numItems(); ++i)
+            compare(*left.item(i), *right.item(i), path + '[' + QByteArray::number(i) + "].");
+        return false;
+    }
+
+    const Report& mReport;
+};
+
+}  // namespace
+
+void compareNodes(const TagMap& left, const TagMap& right, const Report& report)
+{
+    NodeComparison(report).compare(left, right, QByteArray());
+}
+
+}  // namespace Kdd

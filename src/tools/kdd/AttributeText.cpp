@@ -1,0 +1,41 @@
+#include "tools/kdd/AttributeText.h"
+
+#include "kddlib/items/TextDecoding.h"
+#include "kddlib/tagmodel/TagMap.h"
+#include "tools/kdd/Report.h"
+
+#include <dcmtk/dcmdata/dcdeftag.h>
+#include <dcmtk/dcmdata/dctag.h>
+
+#include <cstring>
+
+namespace Kdd
+{
+
+QByteArray keyText(const DcmTagKey& key)
+{
+    return QString::asprintf("(%04x,%04x)", unsigned(key.getGroup()), unsigned(key.getElement())).toLatin1();
+}
+
+QByteArray keywordOf(const TagMap& node, const DcmTagKey& key)
+{
+    DcmTag tag(key, node.privateCreator(key));
+    const char* name = tag.getTagName();
+    return std::strcmp(name, DcmTag_ERROR_TagName) == 0 ? QByteArray() : QByteArray(name);
+}
+
+QString displayText(const TagMap& node, const QByteArray& bytes)
+{
+    QByteArray characterSet;
+    node.findAndGetString(DCM_SpecificCharacterSet, characterSet);
+    return withoutControls(decodeText(bytes, characterSet));
+}
+
+QString displayValue(const TagMap& node, const DcmTagKey& key)
+{
+    QByteArray text;
+    node.findAndGetString(key, text);
+    return displayText(node, text);
+}
+
+}  // namespace Kdd

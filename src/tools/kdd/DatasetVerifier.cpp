@@ -1,0 +1,148 @@
+#include "tools/kdd/DatasetVerifier.h"
+
+#include "kddlib/Limits.h"
+#include "kddlib/tagmodel/TagMap.h"
+#include "kddlib/tagmodel/TagSequence.h"
+#include "tools/kdd/AttributeText.h"
+
+#include <dcmtk/dcmdata/dctk.h>
+
+namespace Kdd
+{
+
+namespace
+{
+
+using Report = std::function<void(const QByteArray&, const QByteArray&)>;
+
+bool isKept(const DcmTagKey& key)
+{
+    return key.getGroup() != 0 && key.getElement() != 0 && key.getGroup() != 0x0006;
+}
+
+/// The value as DCMTK gives it: text without padding, all else byte by byte.
+bool valueOf(DcmElement& element, QByteArray& value)
+{
+    if (DcmVR(element.getVR()).isaString()) {
+        char* text = nullptr;
+        if (element.getString(text).bad())
+            return false;
+        value = QByteArray(text);
+        return true;
+    }
+    value.resize(static_cast<int>(element.getLengthField()));
+    return value.isEmpty() || element.getPartialValue(value.data(), 0, element.getLengthField()).good();
+}
+
+bool mayBeOmitted(DcmElement& element)
+{
+    // Encapsulated pixel data has no length of its own.
+    return element.getLengthField() > kDefaultValueBound || element.ident() == EVR_PixelData;
+}
+
+class Verifier
+{
+public:
+    explicit Verifier(const Report& report)
+        : mReport(report)
+    {
+    }
+
+    int faults() const { return mFaults; }
+
+    void verify(DcmItem& item, const TagMap& map, const QByteArray& prefix)
+    {
+        const TagMap::iterator end = map.end();
+        TagMap::iterator held = map.begin();
+        for (DcmObject* object = item.nextInContainer(nullptr); object != nullptr;
+             object = item.nextInContainer(object)) {
+            const DcmTagKey key = object->getTag();
+            if (!isKept(key))
+                continue;
+            for (; held != end && held.key() < key; ++held)
+                onlyHeld(held.key(), prefix);
+            if (held == end || held.key() != key) {
+                fault(prefix + keyText(key), "is not in the tag file");
+                continue;
+            }
+            object->ident() == EVR_SQ
+                ? sequence(static_cast<DcmSequenceOfItems&>(*object), *held.value(), prefix)
+                : element(static_cast<DcmElement&>(*object), *held.value(), prefix);
+            ++held;
+        }
+        for (; held != end; ++held)
+            onlyHeld(held.key(), prefix);
+    }
+
+private:
+    void fault(const QByteArray& path, const QByteArray& text)
+    {
+        ++mFaults;
+        mReport(path, text);
+    }
+
+    void onlyHeld(const DcmTagKey& key, const QByteArray& prefix)
+    {
+        if (isKept(key))
+            fault(prefix + keyText(key), "is not in the DICOM file");
+    }
+
+    void sequence(DcmSequenceOfItems& sequence, const TagElement& held, const QByteArray& prefix)
+    {
+        const QByteArray path = prefix + keyText(sequence.getTag());
+        if (held.markedAsOmitted()) {
+            if (sequence.getLength(EXS_LittleEndianImplicit, EET_UndefinedLength) <= kDefaultValueBound)
+                fault(path, "is left out of the tag file");
+            return;
+        }
+        const auto* items = held.isSequence() ? static_cast<const TagSequence*>(&held) : nullptr;
+        if (items == nullptr || static_cast<unsigned long>(items->numItems()) != sequence.card()) {
+            fault(path, "has other items in the tag file");
+            return;
+        }
+        int i = 0;
+        for (DcmObject* item = sequence.nextInContainer(nullptr); item != nullptr;
+             item = sequence.nextInContainer(item), ++i)
+            verify(static_cast<DcmItem&>(*item), *items->item(i), path + '[' + QByteArray::number(i) + "].");
+    }
+
+    void element(DcmElement& element, const TagElement& held, const QByteArray& prefix)
+    {
+        const QByteArray path = prefix + keyText(element.getTag());
+        QByteArray value;
+        if (held.markedAsOmitted()) {
+            if (!mayBeOmitted(element))
+                fault(path, "is left out of the tag file");
+        } else if (held.vr() != vrCodeOf(element.getVR())) {
+            fault(path, QByteArray("has VR ") + DcmVR(element.getVR()).getVRName() + ", in the tag file " +
+                            vrName(held.vr()));
+        } else if (!valueOf(element, value)) {
+            fault(path, "cannot be read from the DICOM file");
+        } else if (value != held.value()) {
+            fault(path, "has " + QByteArray::number(value.size()) + " bytes [" + shown(held, value) +
+                            "], in the tag file " + QByteArray::number(held.value().size()) + " bytes [" +
+                            shown(held, held.value()) + ']');
+        }
+    }
+
+    static QByteArray shown(const TagElement& held, const QByteArray& value)
+    {
+        QByteArray text;
+        TagElement(held.vr(), value).getValueAsString(text);
+        return text.left(60);
+    }
+
+    const Report& mReport;
+    int mFaults = 0;
+};
+
+}  // namespace
+
+int verifyDataset(DcmItem& dataset, const TagMap& image, const Report& report)
+{
+    Verifier verifier(report);
+    verifier.verify(dataset, image, QByteArray());
+    return verifier.faults();
+}
+
+}  // namespace Kdd

@@ -1,0 +1,45 @@
+#pragma once
+
+#include <QByteArray>
+#include <QString>
+#include <QStringList>
+
+#include <memory>
+
+namespace Kdd
+{
+
+class TagMap;
+
+/// What became of one file that was offered.
+struct DicomInput
+{
+    enum class Kind {
+        Image,     ///< `map` holds it
+        NotDicom,  ///< something else, which is no fault
+        Unusable,  ///< cannot be read, or would not be found again
+    };
+
+    Kind kind = Kind::NotDicom;
+    QString path;
+    QString reason;               ///< of anything but an image
+    std::unique_ptr<TagMap> map;  ///< parentless
+    QByteArray studyUID;
+    qint64 fileBytes = 0;
+    qint64 headerBytes = 0;  ///< the file without its pixel data
+
+    DicomInput();
+    DicomInput(DicomInput&&) noexcept;
+    DicomInput& operator=(DicomInput&&) noexcept;
+    ~DicomInput();
+};
+
+/// Reads one file. Media directories (DICOMDIR) count as not DICOM: they describe files, not patients. May be called
+/// on several threads at once.
+DicomInput readDicomInput(const QString& path);
+
+/// The files at and below the paths, sorted within each folder. Paths that do not exist or cannot be entered are put
+/// into `faults` with the reason.
+QStringList filesBelow(const QStringList& paths, QStringList& faults);
+
+}  // namespace Kdd

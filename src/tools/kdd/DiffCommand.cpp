@@ -1,0 +1,120 @@
+#include "kddlib/tagmodel/TagMap.h"
+#include "platform/base/LogFile.h"
+#include "tools/kdd/AttributeDiff.h"
+#include "tools/kdd/Commands.h"
+#include "tools/kdd/DicomInput.h"
+#include "tools/kdd/Report.h"
+#include "tools/kdd/Store.h"
+
+#include <QFileInfo>
+#include <QJsonArray>
+
+#include <cstdio>
+
+namespace Kdd
+{
+
+namespace
+{
+
+constexpr char kTagFileMagic[] = "TaCa";
+
+bool isTagFile(const QString& path)
+{
+    QFile file(path);
+    return file.open(QIODevice::ReadOnly) && file.read(4) == kTagFileMagic;
+}
+
+/// Reads what the user names: a tag file, a DICOM file, or a study of the store.
+bool readNamed(const QString& name, TagFile& file)
+{
+    if (!QFileInfo(name).isFile())
+        return readStudy(name.toLocal8Bit(), file);
+    if (isTagFile(name))
+        return readStudyFile(name, file);
+    DicomInput input = readDicomInput(name);
+    if (input.kind == DicomInput::Kind::Image)
+        return file.addTagMap(input.map.release(), name.toLocal8Bit().constData(), true) != nullptr;
+    LogFile::errorf("Could not load %s: %s", qUtf8Printable(name), qUtf8Printable(input.reason));
+    return false;
+}
+
+class Comparison
+{
+public:
+    explicit Comparison(const GlobalOptions& options)
+        : mOptions(options)
+    {
+    }
+
+    void compare(const TagFile& left, const TagFile& right)
+    {
+        const auto& mine = left.imagesByUID();
+        const auto& theirs = right.imagesByUID();
+        // Two single images are meant to be compared even when they do not bear the same UID.
+        if (mine.size() == 1 && theirs.size() == 1) {
+            compareImages(mine.firstKey(), *mine.first(), *theirs.first());
+            return;
+        }
+        for (auto it = mine.cbegin(); it != mine.cend(); ++it) {
+            if (const TagMap* other = theirs.value(it.key(), nullptr))
+                compareImages(it.key(), *it.value(), *other);
+            else
+                tell(it.key(), {"", "", "image", "-"});
+        }
+        for (auto it = theirs.cbegin(); it != theirs.cend(); ++it) {
+            if (!mine.contains(it.key()))
+                tell(it.key(), {"", "", "-", "image"});
+        }
+    }
+
+    Outcome report() const
+    {
+        if (mOptions.json)
+            printJson({{QStringLiteral("differences"), mList}});
+        else if (!mOptions.quiet)
+            std::printf("%d differences\n", mCount);
+        return mCount == 0 ? Outcome::Done : Outcome::Failed;
+    }
+
+private:
+    void compareImages(const QByteArray& key, const TagMap& left, const TagMap& right)
+    {
+        compareNodes(left, right, [&](const AttributeDifference& difference) { tell(key, difference); });
+    }
+
+    void tell(const QByteArray& image, const AttributeDifference& difference)
+    {
+        ++mCount;
+        if (mOptions.json) {
+            mList.append(QJsonObject{{QStringLiteral("image"), displayText(image)},
+                                     {QStringLiteral("path"), displayText(difference.path)},
+                                     {QStringLiteral("name"), displayText(difference.name)},
+                                     {QStringLiteral("left"), displayText(difference.left)},
+                                     {QStringLiteral("right"), displayText(difference.right)}});
+            return;
+        }
+        std::printf("%s  %s %s: %s <> %s\n", qUtf8Printable(displayText(image)), difference.path.constData(),
+                    difference.name.constData(), qUtf8Printable(displayText(difference.left)),
+                    qUtf8Printable(displayText(difference.right)));
+    }
+
+    const GlobalOptions& mOptions;
+    QJsonArray mList;
+    int mCount = 0;
+};
+
+}  // namespace
+
+Outcome runDiff(const GlobalOptions& options, const QString& left, const QString& right)
+{
+    TagFile leftFile;
+    TagFile rightFile;
+    if (!readNamed(left, leftFile) || !readNamed(right, rightFile))
+        return Outcome::Failed;
+    Comparison comparison(options);
+    comparison.compare(leftFile, rightFile);
+    return comparison.report();
+}
+
+}  // namespace Kdd

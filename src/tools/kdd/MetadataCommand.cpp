@@ -1,0 +1,62 @@
+#include "kddlib/items/DicomJson.h"
+#include "kddlib/tagmodel/TagMap.h"
+#include "platform/base/LogFile.h"
+#include "tools/kdd/Commands.h"
+#include "tools/kdd/NodeLookup.h"
+
+#include <dcmtk/dcmdata/dcdeftag.h>
+
+#include <iostream>
+
+namespace Kdd
+{
+
+namespace
+{
+
+std::string uid(const TagMap& image, const DcmTagKey& key)
+{
+    QByteArray text;
+    image.findAndGetString(key, text);
+    return text.toStdString();
+}
+
+/// Where a web service would offer what the image's metadata leaves out.
+std::string bulkDataRoot(const TagMap& image)
+{
+    return "studies/" + uid(image, DCM_StudyInstanceUID) + "/series/" + uid(image, DCM_SeriesInstanceUID) +
+           "/instances/" + uid(image, DCM_SOPInstanceUID) + "/bulkdata";
+}
+
+void collectImages(const TagMap& node, QList<const TagMap*>& images)
+{
+    if (depthOf(node) == 2)
+        images.append(&node);
+    for (const TagMap* child : node.children())
+        collectImages(*child, images);
+}
+
+}  // namespace
+
+Outcome runMetadata(const GlobalOptions&, const NodeSelection& selection)
+{
+    TagFile file;
+    const TagMap* node = findNode(selection, file);
+    if (node == nullptr)
+        return Outcome::Failed;
+    QList<const TagMap*> images;
+    collectImages(*node, images);
+    const char* separator = "[\n";
+    for (const TagMap* image : qAsConst(images)) {
+        std::cout << separator;
+        writeDicomJson(std::cout, *image, bulkDataRoot(*image));
+        separator = ",\n";
+    }
+    std::cout << (images.isEmpty() ? "[]\n" : "\n]\n") << std::flush;
+    if (std::cout.good())
+        return Outcome::Done;
+    LogFile::errorf("Standard output cannot be written");
+    return Outcome::Failed;
+}
+
+}  // namespace Kdd

@@ -1,0 +1,39 @@
+#include "tools/kdd/NodeLookup.h"
+
+#include "kddlib/tagmodel/TagMap.h"
+#include "platform/base/LogFile.h"
+#include "tools/kdd/Store.h"
+
+namespace Kdd
+{
+
+TagMap* findNode(const NodeSelection& selection, TagFile& file)
+{
+    if (!readStudy(selection.study, file))
+        return nullptr;
+    TagMap* series = file.findSeries(selection.series);
+    if (!selection.series.isEmpty() && series == nullptr) {
+        LogFile::errorf("Study %s has no series %s", file.studyInstanceUID().constData(),
+                        selection.series.constData());
+        return nullptr;
+    }
+    if (selection.image.isEmpty())
+        return selection.series.isEmpty() ? file.study().get() : series;
+    TagMap* image = file.findImage(selection.image);
+    if (image != nullptr && (selection.series.isEmpty() || image->parent() == series))
+        return image;
+    LogFile::errorf("Study %s has no image %s%s%s", file.studyInstanceUID().constData(),
+                    selection.image.constData(), selection.series.isEmpty() ? "" : " in series ",
+                    selection.series.constData());
+    return nullptr;
+}
+
+int depthOf(const TagMap& node)
+{
+    int depth = 0;
+    for (const TagMap* above = node.parent(); above != nullptr; above = above->parent())
+        ++depth;
+    return depth;
+}
+
+}  // namespace Kdd

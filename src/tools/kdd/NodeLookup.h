@@ -1,0 +1,16 @@
+#pragma once
+
+#include "kddlib/tagfile/TagFile.h"
+#include "tools/kdd/Commands.h"
+
+namespace Kdd
+{
+
+/// Reads the study and finds the node that the selection names; null, with the reason logged, when there is none.
+/// Owned by `file`.
+TagMap* findNode(const NodeSelection& selection, TagFile& file);
+
+/// 0 for a study, 1 for a series, 2 for an image.
+int depthOf(const TagMap& node);
+
+}  // namespace Kdd

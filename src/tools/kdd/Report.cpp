@@ -1,0 +1,69 @@
+#include "tools/kdd/Report.h"
+
+#include "kddlib/items/TextDecoding.h"
+
+#include <QJsonDocument>
+
+#include <cstdio>
+
+namespace Kdd
+{
+
+void printJson(const QJsonObject& object)
+{
+    const QByteArray text = QJsonDocument(object).toJson(QJsonDocument::Compact);
+    std::printf("%s\n", text.constData());
+}
+
+void printTable(const QList<QStringList>& rows)
+{
+    if (rows.isEmpty())
+        return;
+    QList<int> widths;
+    for (const QStringList& row : rows) {
+        for (int i = 0; i < row.size(); ++i) {
+            if (i >= widths.size())
+                widths.append(0);
+            widths[i] = qMax(widths.at(i), row.at(i).size());
+        }
+    }
+    for (const QStringList& row : rows) {
+        QString line;
+        for (int i = 0; i < row.size(); ++i) {
+            const bool isNumber = rows.first().at(i).endsWith(QLatin1Char(' '));
+            const QString cell = row.at(i).trimmed();
+            line += isNumber ? cell.rightJustified(widths.at(i)) : cell.leftJustified(widths.at(i));
+            line += QStringLiteral("  ");
+        }
+        std::printf("%s\n", qUtf8Printable(line.trimmed()));
+    }
+}
+
+QString humanBytes(qint64 bytes)
+{
+    const char* const units[] = {"B", "KB", "MB", "GB", "TB"};
+    double value = static_cast<double>(bytes);
+    int unit = 0;
+    while (value >= 1000 && unit < 4) {
+        value /= 1000;
+        ++unit;
+    }
+    return QString::asprintf(unit == 0 ? "%.0f %s" : "%.1f %s", value, units[unit]);
+}
+
+QString withoutControls(const QString& text)
+{
+    QString shown = text;
+    for (QChar& c : shown) {
+        if (c < QLatin1Char(' ') || (c >= QChar(0x7f) && c < QChar(0xa0)))
+            c = QLatin1Char(' ');
+    }
+    return shown;
+}
+
+QString displayText(const QByteArray& text)
+{
+    return withoutControls(decodeText(text, QByteArray()));
+}
+
+}  // namespace Kdd

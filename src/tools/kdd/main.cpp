@@ -1,0 +1,233 @@
+#include "kddlib/tagfile/TagFile.h"
+#include "platform/base/BuildInfo.h"
+#include "platform/base/LogFile.h"
+#include "tools/kdd/Commands.h"
+
+#include <QStandardPaths>
+
+#include <dcmtk/config/osconfig.h>
+
+#include <CLI/CLI.hpp>
+#include <dcmtk/oflog/oflog.h>
+
+#include <cstdio>
+#include <exception>
+#include <functional>
+#include <map>
+
+namespace Kdd
+{
+
+namespace
+{
+
+struct StoreOptions
+{
+    std::string store;
+    std::string meta;
+    TagFile::CompressionMode compression = TagFile::CompressionMode::Zlib;
+    bool flush = false;
+};
+
+/// The command chosen, ready to run once the global options are in force.
+using Command = std::function<Outcome()>;
+
+const std::map<std::string, TagFile::CompressionMode> kCompressionNames = {
+    {"none", TagFile::CompressionMode::None},
+    {"zlib", TagFile::CompressionMode::Zlib},
+    {"lzma", TagFile::CompressionMode::Lzma},
+};
+
+QByteArray bytes(const std::string& text)
+{
+    return {text.data(), static_cast<int>(text.size())};
+}
+
+QString path(const std::string& text)
+{
+    return QString::fromLocal8Bit(bytes(text));
+}
+
+void addGlobalOptions(CLI::App& app, GlobalOptions& global, StoreOptions& store)
+{
+    app.add_option("--store", store.store, "Folder of everything that is kept")->envname("KDD_STORE");
+    app.add_option("--meta", store.meta, "Folder of the tag files (default: meta inside the store)")
+        ->envname("KDD_META_FOLDER");
+    app.add_option("--compression", store.compression, "How tag files are written: none, zlib or lzma")
+        ->transform(CLI::CheckedTransformer(kCompressionNames, CLI::ignore_case))
+        ->envname("KDD_COMPRESSION");
+    app.add_flag("--flush", store.flush, "Flush every write to disk, against power loss")
+        ->envname("KDD_FLUSH");
+    app.add_flag("--json", global.json, "Machine-readable result on standard output");
+    app.add_flag("--quiet", global.quiet, "No progress, only errors");
+    app.add_flag("--verbose", global.verbose, "Name what is passed over, and how long things take");
+    app.set_version_flag("--version", BuildInfo::text());
+}
+
+void applyStore(const GlobalOptions& global, const StoreOptions& store)
+{
+    LogFile::setLevel(global.quiet     ? LogFile::Level::Errors
+                      : global.verbose ? LogFile::Level::Timing
+                                       : LogFile::Level::Warnings);
+    // DCMTK's own lines do not name the file; what matters of them is told with it.
+    OFLog::configure(global.verbose ? OFLogger::WARN_LOG_LEVEL : OFLogger::OFF_LOG_LEVEL);
+    std::string meta = store.meta;
+    if (meta.empty()) {
+        const QString root = store.store.empty()
+                                 ? QStandardPaths::writableLocation(QStandardPaths::GenericDataLocation) +
+                                       QStringLiteral("/kdd")
+                                 : path(store.store);
+        meta = (root + QStringLiteral("/meta")).toLocal8Bit().toStdString();
+    }
+    TagFile::setMetaFolder(meta.c_str());
+    TagFile::setCompressionMode(store.compression);
+    if (store.flush)
+        TagFile::setDurability(TagFile::Durability::PowerLoss);
+}
+
+/// The options of a node below a study; the strings live as long as the application.
+struct NodeArguments
+{
+    std::string study;
+    std::string series;
+    std::string image;
+
+    void addTo(CLI::App& command)
+    {
+        command.add_option("UID", study, "Study Instance UID, or a unique beginning of it")->required();
+        command.add_option("--series", series, "Series Instance UID");
+        command.add_option("--image", image, "SOP Instance UID");
+    }
+
+    NodeSelection selection() const { return {bytes(study), bytes(series), bytes(image)}; }
+};
+
+/// Declares the subcommands and keeps what their arguments are read into.
+class CommandLine
+{
+public:
+    CommandLine(CLI::App& app, const GlobalOptions& global, Command& chosen)
+        : mApp(app)
+        , mGlobal(global)
+        , mChosen(chosen)
+    {
+        declareStoring();
+        declareReading();
+        declareChecking();
+    }
+
+private:
+    CLI::App& declare(const char* name, const char* description, Command command)
+    {
+        CLI::App* subcommand = mApp.add_subcommand(name, description);
+        subcommand->fallthrough();
+        subcommand->callback([this, command] { mChosen = command; });
+        return *subcommand;
+    }
+
+    void declareStoring()
+    {
+        declare("add", "Take the DICOM files below the paths into the tag files of their studies",
+                [this] {
+                    QStringList paths;
+                    for (const std::string& text : mPaths)
+                        paths.append(path(text));
+                    return runAdd(mGlobal, paths);
+                })
+            .add_option("PATH", mPaths, "Files and folders")
+            ->required();
+        mNode.addTo(declare("delete", "Delete a study's tag file, a series or an image",
+                            [this] { return runDelete(mGlobal, mNode.selection()); }));
+        CLI::App& sample = declare("sample", "Write synthetic studies", [this] {
+            return runSample(mGlobal, {path(mFolder), mImages, mSeed});
+        });
+        sample.add_option("DIR", mFolder, "Folder to write to")->required();
+        sample.add_option("--images", mImages, "About how many images in all")
+            ->check(CLI::Range(1, 10000000));
+        sample.add_option("--seed", mSeed, "Another seed gives other studies");
+    }
+
+    void declareReading()
+    {
+        declare("list", "List the studies", [this] { return runList(mGlobal); });
+        CLI::App& show = declare("show", "Show the attributes of a node", [this] {
+            return runShow(mGlobal, {mNode.selection(), mOwn, mTree});
+        });
+        mNode.addTo(show);
+        show.add_flag("--own", mOwn, "Only what the node itself holds, not what it inherits");
+        show.add_flag("--tree", mTree, "The nodes below instead of attributes");
+        mNode.addTo(declare("metadata", "Write images as DICOM JSON",
+                            [this] { return runMetadata(mGlobal, mNode.selection()); }));
+        declare("stat", "Show counters and sizes of a study's tag file",
+                [this] { return runStat(mGlobal, bytes(mNode.study)); })
+            .add_option("UID", mNode.study, "Study Instance UID, or a unique beginning of it")
+            ->required();
+    }
+
+    void declareChecking()
+    {
+        CLI::App& diff = declare("diff", "Compare two studies or files attribute by attribute",
+                                 [this] { return runDiff(mGlobal, path(mLeft), path(mRight)); });
+        diff.add_option("LEFT", mLeft, "Study UID, tag file or DICOM file")->required();
+        diff.add_option("RIGHT", mRight, "Study UID, tag file or DICOM file")->required();
+        CLI::App& verify =
+            declare("verify", "Hold tag files against the DICOM files they were made from", [this] {
+                StudySelection selection;
+                selection.all = mAll;
+                for (const std::string& text : mStudies)
+                    selection.studies.append(bytes(text));
+                return runVerify(mGlobal, selection);
+            });
+        verify.add_option("UID", mStudies, "Study Instance UIDs, or unique beginnings of them");
+        verify.add_flag("--all", mAll, "Every study");
+    }
+
+    CLI::App& mApp;
+    const GlobalOptions& mGlobal;
+    Command& mChosen;
+
+    std::vector<std::string> mPaths;
+    NodeArguments mNode;
+    std::string mFolder;
+    int mImages = 400;
+    unsigned mSeed = 1;
+    bool mOwn = false;
+    bool mTree = false;
+    std::string mLeft;
+    std::string mRight;
+    std::vector<std::string> mStudies;
+    bool mAll = false;
+};
+
+Outcome run(int argc, char** argv)
+{
+    CLI::App app("Tag files: the metadata cache of a medical-imaging server", "kdd");
+    app.require_subcommand(1);
+    app.fallthrough();
+    GlobalOptions global;
+    StoreOptions store;
+    Command chosen;
+    addGlobalOptions(app, global, store);
+    CommandLine commands(app, global, chosen);
+    try {
+        app.parse(argc, argv);
+    } catch (const CLI::ParseError& fault) {
+        return app.exit(fault) == 0 ? Outcome::Done : Outcome::WrongUsage;
+    }
+    applyStore(global, store);
+    return chosen();
+}
+
+}  // namespace
+
+}  // namespace Kdd
+
+int main(int argc, char** argv)
+{
+    try {
+        return static_cast<int>(Kdd::run(argc, argv));
+    } catch (const std::exception& fault) {
+        std::fprintf(stderr, "kdd: %s\n", fault.what());
+        return static_cast<int>(Kdd::Outcome::Failed);
+    }
+}
