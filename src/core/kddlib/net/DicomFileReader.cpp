@@ -1,6 +1,7 @@
 #include "kddlib/net/DicomFileReader.h"
 
 #include "kddlib/Limits.h"
+#include "kddlib/net/BufferedFileProducer.h"
 
 #include <dcmtk/dcmdata/dcfilefo.h>
 #include <dcmtk/dcmdata/dcistrmf.h>
@@ -64,33 +65,35 @@ private:
 };
 
 /// A file stream that turns bad as soon as the parser nests too deep, which makes it unwind.
-class DepthLimitedFileStream : public DcmInputFileStream
+class DepthLimitedFileStream : public DcmInputStream
 {
 public:
-    explicit DepthLimitedFileStream(const char* path)
-        : DcmInputFileStream(OFFilename(path))
-    {
-    }
+    explicit DepthLimitedFileStream(const char* path) : DcmInputStream(&mProducer), mProducer(path), mPath(path) {}
 
     offile_off_t read(void* buffer, offile_off_t length) override
     {
         if (mTooDeep)
             return 0;
-        const offile_off_t count = DcmInputFileStream::read(buffer, length);
+        const offile_off_t count = DcmInputStream::read(buffer, length);
         mTooDeep = !mGauge.accept(buffer, count, __builtin_frame_address(0));
         return count;
     }
 
-    OFBool good() const override { return !mTooDeep && DcmInputFileStream::good(); }
+    OFBool good() const override { return !mTooDeep && DcmInputStream::good(); }
 
-    OFCondition status() const override
+    OFCondition status() const override { return mTooDeep ? OFCondition(EC_NestedTooDeep) : DcmInputStream::status(); }
+
+    /// How DCMTK finds a long value again that it has left in the file. In deflated data no offset leads to it.
+    DcmInputStreamFactory* newFactory() const override
     {
-        return mTooDeep ? OFCondition(EC_NestedTooDeep) : DcmInputFileStream::status();
+        return currentProducer() == &mProducer ? new DcmInputFileStreamFactory(mPath, tell()) : nullptr;
     }
 
     bool isTooDeep() const { return mTooDeep; }
 
 private:
+    BufferedFileProducer mProducer;
+    OFFilename mPath;
     NestingGauge mGauge;
     bool mTooDeep = false;
 };

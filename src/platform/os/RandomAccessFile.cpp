@@ -1,0 +1,52 @@
+#include "platform/os/RandomAccessFile.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+
+namespace Kdd
+{
+
+RandomAccessFile::~RandomAccessFile()
+{
+    if (mDescriptor >= 0)
+        ::close(mDescriptor);
+}
+
+int RandomAccessFile::open(const char* path)
+{
+    // A pipe in place of a file would hold the caller until somebody writes to it.
+    mDescriptor = ::open(path, O_RDONLY | O_CLOEXEC | O_NONBLOCK);
+    if (mDescriptor < 0)
+        return errno;
+    struct stat status = {};
+    if (::fstat(mDescriptor, &status) != 0)
+        return errno;
+    if (S_ISDIR(status.st_mode))
+        return EISDIR;
+    if (!S_ISREG(status.st_mode))
+        return EINVAL;
+    mSize = status.st_size;
+    return 0;
+}
+
+qint64 RandomAccessFile::readAt(qint64 offset, void* bytes, qint64 count) const
+{
+    qint64 done = 0;
+    while (done < count) {
+        const ssize_t got =
+            ::pread(mDescriptor, static_cast<char*>(bytes) + done, static_cast<size_t>(count - done), offset + done);
+        if (got < 0 && errno == EINTR)
+            continue;
+        if (got < 0)
+            return -1;
+        if (got == 0)
+            break;
+        done += got;
+    }
+    return done;
+}
+
+}  // namespace Kdd
