@@ -1,5 +1,8 @@
 // What the cache costs, beside what its users would do without it: opening the DICOM files. Every benchmark reports
 // images per second; sizes are counters. Compare only what ran in one run.
+//
+// Growth is measured as NAME/20/1000 (twenty studies of 1,000 images) against NAME/1/20000: both work on the same
+// amount of memory, so that the processor's caches, into which one small study fits, do not take part.
 
 #include "bench/Workload.h"
 #include "kddlib/tagmodel/TagMap.h"
@@ -10,6 +13,8 @@
 #include <benchmark/benchmark.h>
 #include <dcmtk/dcmdata/dctk.h>
 #include <dcmtk/oflog/oflog.h>
+
+#include <vector>
 
 namespace Kdd
 {
@@ -67,34 +72,49 @@ void buildTagFile(benchmark::State& state)
     state.counters["headers/bytes"] = static_cast<double>(thousandImages().headerBytes()) / bytes.size();
 }
 
+/// As many studies of as many images as the benchmark's arguments say.
+std::vector<std::unique_ptr<TagFile>> studiesFor(const benchmark::State& state)
+{
+    std::vector<std::unique_ptr<TagFile>> studies;
+    for (int64_t i = 0; i < state.range(0); ++i)
+        studies.push_back(thousandImages().study(static_cast<int>(state.range(1))));
+    return studies;
+}
+
+void countImagesOfStudies(benchmark::State& state)
+{
+    countImages(state, state.range(0) * state.range(1));
+}
+
 void addImages(benchmark::State& state)
 {
-    const int images = static_cast<int>(state.range(0));
-    const std::unique_ptr<TagFile> source = thousandImages().study(images);
+    const std::unique_ptr<TagFile> source = thousandImages().study(static_cast<int>(state.range(1)));
     for (auto step : state) {
-        TagFile file;
-        for (const TagMap* image : source->imagesByUID())
-            file.addTagMap(image->clone(), nullptr, false);
+        std::vector<TagFile> files(static_cast<std::size_t>(state.range(0)));
+        for (TagFile& file : files) {
+            for (const TagMap* image : source->imagesByUID())
+                file.addTagMap(image->clone(), nullptr, false);
+        }
         state.PauseTiming();
-        file.clear();
+        files.clear();
         state.ResumeTiming();
     }
-    countImages(state, images);
+    countImagesOfStudies(state);
 }
 
 void optimizeAll(benchmark::State& state)
 {
-    const int images = static_cast<int>(state.range(0));
     for (auto step : state) {
         state.PauseTiming();
-        std::unique_ptr<TagFile> file = thousandImages().study(images);
+        auto studies = studiesFor(state);
         state.ResumeTiming();
-        file->optimizeAll();
+        for (const auto& study : studies)
+            study->optimizeAll();
         state.PauseTiming();
-        file.reset();
+        studies.clear();
         state.ResumeTiming();
     }
-    countImages(state, images);
+    countImagesOfStudies(state);
 }
 
 void writeTagFile(benchmark::State& state, TagFile::CompressionMode mode)
@@ -112,30 +132,30 @@ void writeTagFile(benchmark::State& state, TagFile::CompressionMode mode)
 
 void readTagFile(benchmark::State& state)
 {
-    const int images = static_cast<int>(state.range(0));
-    const QByteArray bytes = written(*optimised(images));
+    const QByteArray bytes = written(*optimised(static_cast<int>(state.range(1))));
     for (auto step : state) {
-        TagFile file;
-        read(file, bytes);
+        std::vector<TagFile> files(static_cast<std::size_t>(state.range(0)));
+        for (TagFile& file : files)
+            read(file, bytes);
         state.PauseTiming();
-        file.clear();
+        files.clear();
         state.ResumeTiming();
     }
-    countImages(state, images);
+    countImagesOfStudies(state);
 }
 
 void destroy(benchmark::State& state)
 {
-    const int images = static_cast<int>(state.range(0));
-    const QByteArray bytes = written(*optimised(images));
+    const QByteArray bytes = written(*optimised(static_cast<int>(state.range(1))));
     for (auto step : state) {
         state.PauseTiming();
-        TagFile file;
-        read(file, bytes);
+        std::vector<TagFile> files(static_cast<std::size_t>(state.range(0)));
+        for (TagFile& file : files)
+            read(file, bytes);
         state.ResumeTiming();
-        file.clear();
+        files.clear();
     }
-    countImages(state, images);
+    countImagesOfStudies(state);
 }
 
 /// One image into the file of a large study, under its lock.
@@ -175,8 +195,13 @@ void findAttribute(benchmark::State& state)
 
 BENCHMARK(loadFile)->Unit(benchmark::kMillisecond);
 BENCHMARK(buildTagFile)->Unit(benchmark::kMillisecond);
-BENCHMARK(addImages)->Arg(1000)->Arg(20000)->Unit(benchmark::kMillisecond);
-BENCHMARK(optimizeAll)->Arg(1000)->Arg(20000)->Unit(benchmark::kMillisecond)->Iterations(3);
+BENCHMARK(addImages)->Args({1, 1000})->Args({20, 1000})->Args({1, 20000})->Unit(benchmark::kMillisecond);
+BENCHMARK(optimizeAll)
+    ->Args({1, 1000})
+    ->Args({20, 1000})
+    ->Args({1, 20000})
+    ->Unit(benchmark::kMillisecond)
+    ->Iterations(3);
 BENCHMARK_CAPTURE(writeTagFile, none, TagFile::CompressionMode::None)
     ->Arg(1000)
     ->Unit(benchmark::kMillisecond);
@@ -186,8 +211,8 @@ BENCHMARK_CAPTURE(writeTagFile, zlib, TagFile::CompressionMode::Zlib)
 BENCHMARK_CAPTURE(writeTagFile, lzma, TagFile::CompressionMode::Lzma)
     ->Arg(1000)
     ->Unit(benchmark::kMillisecond);
-BENCHMARK(readTagFile)->Arg(1000)->Arg(20000)->Unit(benchmark::kMillisecond);
-BENCHMARK(destroy)->Arg(1000)->Arg(20000)->Unit(benchmark::kMillisecond);
+BENCHMARK(readTagFile)->Args({1, 1000})->Args({20, 1000})->Args({1, 20000})->Unit(benchmark::kMillisecond);
+BENCHMARK(destroy)->Args({1, 1000})->Args({20, 1000})->Args({1, 20000})->Unit(benchmark::kMillisecond);
 BENCHMARK(mergeOneImage)->Arg(1000)->Arg(20000)->Unit(benchmark::kMillisecond);
 BENCHMARK(findAttribute);
 

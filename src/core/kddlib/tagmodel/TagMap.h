@@ -11,6 +11,7 @@
 
 #include <memory>
 #include <string>
+#include <vector>
 
 class DcmElement;
 class DcmItem;
@@ -228,6 +229,7 @@ protected:
 
 private:
     enum class Match { Bytes, BytesAndVr };
+    using Elements = std::vector<const TagElement*>;
 
     static TagMap* createTagMap(DcmItem* item, unsigned int maxLength, int depth);
     TagSequence* setSequence(DcmSequenceOfItems* sequence, unsigned int maxLength, int depth);
@@ -252,8 +254,7 @@ private:
 
     static bool equals(const TagElement& element, VrCode vr, const QByteArray& value, Match match);
     void storeHere(const DcmTagKey& key, VrCode vr, const QByteArray& value, Match match);
-    class Survey;
-    void place(const DcmTagKey& key, Survey& survey);
+    void place(const DcmTagKey& key, const Elements& held);
     void forgetUnseen(const DcmTagKey& key, bool childrenAreMarked);
 
     /// What the reading of one tag file's records shares.
