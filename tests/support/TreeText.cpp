@@ -21,34 +21,35 @@ std::string line(int indent, const DcmTagKey& key, const TagElement& element)
     return start + value.toStdString() + '\n';
 }
 
+using Lines = std::string (*)(const TagMap& node, int indent);
+
+/// A line for the element and, for a sequence, what `lines` makes of its items.
+std::string entry(int indent, const DcmTagKey& key, const TagElement& element, Lines lines)
+{
+    std::string text = line(indent, key, element);
+    if (!element.isSequence())
+        return text;
+    const auto& sequence = static_cast<const TagSequence&>(element);
+    for (int i = 0; i < sequence.numItems(); ++i)
+        text += std::string(static_cast<std::size_t>(indent) + 1, ' ') + "item\n" +
+                lines(*sequence.item(i), indent + 2);
+    return text;
+}
+
 std::string shown(const TagMap& node, int indent)
 {
     std::string text;
     const TagMap::iterator end = node.end();
-    for (TagMap::iterator it = node.begin(); it != end; ++it) {
-        text += line(indent, it.key(), *it.value());
-        if (!it.value()->isSequence())
-            continue;
-        const auto& sequence = static_cast<const TagSequence&>(*it.value());
-        for (int i = 0; i < sequence.numItems(); ++i)
-            text += std::string(static_cast<std::size_t>(indent) + 1, ' ') + "item\n" +
-                    shown(*sequence.item(i), indent + 2);
-    }
+    for (TagMap::iterator it = node.begin(); it != end; ++it)
+        text += entry(indent, it.key(), *it.value(), shown);
     return text;
 }
 
 std::string own(const TagMap& node, int indent)
 {
     std::string text;
-    for (auto it = node.tagsForLevel().cbegin(); it != node.tagsForLevel().cend(); ++it) {
-        text += line(indent, it.key(), *it.value());
-        if (!it.value()->isSequence())
-            continue;
-        const auto& sequence = static_cast<const TagSequence&>(*it.value());
-        for (int i = 0; i < sequence.numItems(); ++i)
-            text += std::string(static_cast<std::size_t>(indent) + 1, ' ') + "item\n" +
-                    own(*sequence.item(i), indent + 2);
-    }
+    for (auto it = node.tagsForLevel().cbegin(); it != node.tagsForLevel().cend(); ++it)
+        text += entry(indent, it.key(), *it.value(), own);
     return text;
 }
 

@@ -202,7 +202,6 @@ private:
 Outcome run(int argc, char** argv)
 {
     CLI::App app("Tag files: the metadata cache of a medical-imaging server", "kdd");
-    app.require_subcommand(1);
     app.fallthrough();
     GlobalOptions global;
     StoreOptions store;
@@ -213,6 +212,10 @@ Outcome run(int argc, char** argv)
         app.parse(argc, argv);
     } catch (const CLI::ParseError& fault) {
         return app.exit(fault) == 0 ? Outcome::Done : Outcome::WrongUsage;
+    }
+    if (!chosen) {
+        std::fprintf(stderr, "kdd: name a command; kdd --help lists them\n");
+        return Outcome::WrongUsage;
     }
     applyStore(global, store);
     return chosen();

@@ -73,7 +73,8 @@ TagMap* TagFile::addTagMap(TagMap* map, const char* path, bool replace)
     const QByteArray studyUID = textOf(*image, DCM_StudyInstanceUID);
     const QByteArray seriesUID = textOf(*image, DCM_SeriesInstanceUID);
     QByteArray key = imageKey(*image);
-    if (key.isEmpty() && path != nullptr)
+    const bool isKnownByPath = key.isEmpty() && path != nullptr;
+    if (isKnownByPath)
         key = path;
     if (key.isEmpty() || (!mStudies.isEmpty() && mStudies.firstKey() != studyUID))
         return nullptr;
@@ -86,6 +87,8 @@ TagMap* TagFile::addTagMap(TagMap* map, const char* path, bool replace)
     placeInSeries(image.get(), seriesUID, studyUID);
     if (path != nullptr)
         image->putAndInsertValue(kSuffix, VrCode::LO, extractSuffix(path));
+    if (isKnownByPath)
+        image->putAndInsertValue(kFilePath, VrCode::LO, path);
     return image.release();
 }
 

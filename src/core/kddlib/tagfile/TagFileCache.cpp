@@ -88,7 +88,10 @@ bool TagFile::openForReading(const QString& path, bool keepOpen)
     if (!hasJournal(path))
         return true;
     mCacheFile.close();
-    return openWhole(path);
+    if (openWhole(path))
+        return true;
+    LogFile::warnf("Could not open %s: %s", qUtf8Printable(path), qUtf8Printable(mFailure));
+    return false;
 }
 
 bool TagFile::openWhole(const QString& path)

@@ -20,6 +20,15 @@ QByteArray hex(quint16 number)
     return QByteArray::number(number, 16).rightJustified(4, '0');
 }
 
+/// Values of several lines must not break the listing's own; escape sequences of character sets stay.
+void keepOnOneLine(QByteArray& text)
+{
+    for (char& c : text) {
+        if (static_cast<unsigned char>(c) < 0x20 && c != '\x1b')
+            c = ' ';
+    }
+}
+
 /// How one line of a text listing is laid out; the two listings differ in what they show and where they cut.
 struct Layout
 {
@@ -78,6 +87,7 @@ private:
             element.getValueAsString(text, key, mMap.privateCreator(key));
         else
             element.getValueAsString(text);
+        keepOnOneLine(text);
         if (text.size() > mLayout.longest)
             text = text.left(mLayout.whenCut) + "...";
         const bool isText = isTextVr(element.vr());
