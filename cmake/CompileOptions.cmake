@@ -1,8 +1,7 @@
-# One interface target that every target of ours links: language, warnings, sanitizers.
+# One interface target that every target of ours links: warnings, sanitizers.
 set(KDD_SANITIZE "" CACHE STRING "Sanitizers to build with, for example address,undefined")
 
 add_library(kdd_options INTERFACE)
-target_compile_features(kdd_options INTERFACE cxx_std_17)
 target_compile_options(kdd_options INTERFACE
   -Wall -Wextra -Wpedantic -Wshadow -Wconversion -Wsign-conversion -Wnon-virtual-dtor -Woverloaded-virtual -Werror)
 target_compile_definitions(kdd_options INTERFACE

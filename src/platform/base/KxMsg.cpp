@@ -120,7 +120,7 @@ QByteArray KxMsg::read(qint64 count)
 {
     if (!has(count))
         return {};
-    const QByteArray taken(mBytes.constData() + mRead, static_cast<int>(count));
+    QByteArray taken(mBytes.constData() + mRead, static_cast<int>(count));
     mRead += static_cast<int>(count);
     return taken;
 }

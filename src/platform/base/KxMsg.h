@@ -4,6 +4,8 @@
 
 #include <QByteArray>
 
+#include <utility>
+
 namespace Kdd
 {
 
@@ -21,8 +23,8 @@ public:
     KxMsg() = default;
 
     /// A message to read; shares the bytes.
-    explicit KxMsg(const QByteArray& bytes)
-        : mBytes(bytes)
+    explicit KxMsg(QByteArray bytes)
+        : mBytes(std::move(bytes))
     {
     }
 

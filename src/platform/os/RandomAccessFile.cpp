@@ -36,8 +36,8 @@ qint64 RandomAccessFile::readAt(qint64 offset, void* bytes, qint64 count) const
 {
     qint64 done = 0;
     while (done < count) {
-        const ssize_t got =
-            ::pread(mDescriptor, static_cast<char*>(bytes) + done, static_cast<size_t>(count - done), offset + done);
+        const ssize_t got = ::pread(mDescriptor, static_cast<char*>(bytes) + done,
+                                    static_cast<size_t>(count - done), offset + done);
         if (got < 0 && errno == EINTR)
             continue;
         if (got < 0)

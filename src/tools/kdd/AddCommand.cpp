@@ -149,14 +149,11 @@ void Adder::write(Pending::iterator study)
     for (int i = 1; i < kMergeAttempts && !isMerged && file.wasLockedOut(); ++i)
         isMerged = file.mergeIntoCacheFile();
     if (isMerged) {
-        int series = 0, images = 0, volumes = 0, blobs = 0, optimise = 0, read = 0, written = 0;
-        int stored = 0, uncompressed = 0, unoptimised = 0, blobBytes = 0;
-        file.getStatistics(series, images, volumes, blobs, optimise, read, written, stored, uncompressed,
-                           unoptimised, blobBytes);
+        const TagFile::Statistics statistics = file.statistics();
         StudyTotals& totals = mTotals[study->first];
-        totals.series = series;
-        totals.images = images;
-        totals.tagFileBytes = stored;
+        totals.series = statistics.series;
+        totals.images = statistics.images;
+        totals.tagFileBytes = statistics.storedSize;
     } else {
         LogFile::errorf("%d images of study %s are not added", study->second.images,
                         study->first.constData());

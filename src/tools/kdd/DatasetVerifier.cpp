@@ -56,7 +56,7 @@ public:
         TagMap::iterator held = map.begin();
         for (DcmObject* object = item.nextInContainer(nullptr); object != nullptr;
              object = item.nextInContainer(object)) {
-            const DcmTagKey key = object->getTag();
+            const DcmTagKey key(object->getGTag(), object->getETag());
             if (!isKept(key))
                 continue;
             for (; held != end && held.key() < key; ++held)

@@ -10,6 +10,7 @@
 
 #include <dcmtk/dcmdata/dctk.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstring>
 
@@ -50,13 +51,11 @@ bool isMediaDirectory(DcmFileFormat& file)
 /// comes from damage, and it would be a trap in lists, logs and requests.
 bool isStrange(const QByteArray& uid)
 {
-    for (const char c : uid) {
+    return std::any_of(uid.begin(), uid.end(), [](char c) {
         const bool isFine = (c >= '0' && c <= '9') || (c >= 'A' && c <= 'Z') || (c >= 'a' && c <= 'z') ||
                             c == '.' || c == '-' || c == '_';
-        if (!isFine)
-            return true;
-    }
-    return false;
+        return !isFine;
+    });
 }
 
 /// The first of the three UIDs that cannot be used as a name; null when all can.

@@ -29,8 +29,8 @@ struct DicomInput
     qint64 headerBytes = 0;  ///< the file without its pixel data
 
     DicomInput();
-    DicomInput(DicomInput&&) noexcept;
-    DicomInput& operator=(DicomInput&&) noexcept;
+    DicomInput(DicomInput&& other) noexcept;
+    DicomInput& operator=(DicomInput&& other) noexcept;
     ~DicomInput();
 };
 

@@ -14,25 +14,22 @@ Outcome runStat(const GlobalOptions& options, const QByteArray& study)
     TagFile file;
     if (!readStudy(study, file))
         return Outcome::Failed;
-    int series = 0, images = 0, volumes = 0, blobs = 0, optimiseMs = 0, readMs = 0, writeMs = 0;
-    int storedSize = 0, uncompressedSize = 0, unoptimisedSize = 0, blobBytes = 0;
-    file.getStatistics(series, images, volumes, blobs, optimiseMs, readMs, writeMs, storedSize,
-                       uncompressedSize, unoptimisedSize, blobBytes);
+    const TagFile::Statistics statistics = file.statistics();
     const struct
     {
         const char* name;
         qint64 value;
-    } rows[] = {{"series", series},
-                {"images", images},
-                {"volumes", volumes},
-                {"blobs", blobs},
-                {"optimiseMs", optimiseMs},
-                {"readMs", readMs},
-                {"writeMs", writeMs},
-                {"storedSize", storedSize},
-                {"uncompressedSize", uncompressedSize},
-                {"unoptimisedSize", unoptimisedSize},
-                {"blobBytes", blobBytes},
+    } rows[] = {{"series", statistics.series},
+                {"images", statistics.images},
+                {"volumes", statistics.volumes},
+                {"blobs", statistics.blobs},
+                {"optimiseMs", statistics.optimiseMs},
+                {"readMs", statistics.readMs},
+                {"writeMs", statistics.writeMs},
+                {"storedSize", statistics.storedSize},
+                {"uncompressedSize", statistics.uncompressedSize},
+                {"unoptimisedSize", statistics.unoptimisedSize},
+                {"blobBytes", statistics.blobBytes},
                 {"fileSize", QFileInfo(file.cacheFilePath()).size()}};
     if (options.json) {
         QJsonObject object;

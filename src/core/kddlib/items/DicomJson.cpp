@@ -74,7 +74,7 @@ void fill(DcmItem& item, const TagMap& map)
             source.isSequence() ? newSequence(it.key(), static_cast<const TagSequence&>(source))
                                 : source.newDcmElement(tagOf(it.key(), source));
         if (element != nullptr && item.insert(element.get()).good())
-            element.release();
+            static_cast<void>(element.release());
     }
 }
 
@@ -114,7 +114,7 @@ public:
         TagMap::iterator source = map.begin();
         for (DcmObject* next = item.nextInContainer(nullptr); next != nullptr;
              next = item.nextInContainer(next)) {
-            const DcmTagKey key = next->getTag();
+            const DcmTagKey key(next->getGTag(), next->getETag());
             for (; source != end && source.key() < key; ++source)
                 omitted(source, address, isFirst);
             const bool isFromMap = source != end && source.key() == key;
@@ -154,7 +154,7 @@ private:
         const std::string key = name(source.key());
         DcmVR vr(tagOf(source.key(), *source.value()).getEVR());
         mOut << '"' << key << "\":{\"vr\":\"" << vr.getValidVRName() << "\",\"BulkDataURI\":";
-        DcmJsonFormat::printString(mOut, (address + '/' + key).c_str());
+        DcmJsonFormat::printString(mOut, address + '/' + key);
         mOut << '}';
     }
 

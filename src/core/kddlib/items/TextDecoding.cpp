@@ -7,6 +7,8 @@
 #include <dcmtk/dcmdata/dcspchrs.h>
 #include <dcmtk/dcmdata/dctk.h>
 
+#include <algorithm>
+
 namespace Kdd
 {
 
@@ -22,11 +24,8 @@ const char* const kUtf8CharacterSet = "ISO_IR 192";
 
 bool isAscii(const QByteArray& bytes)
 {
-    for (const char c : bytes) {
-        if (c == kEscape || static_cast<signed char>(c) < 0)
-            return false;
-    }
-    return true;
+    return std::all_of(bytes.begin(), bytes.end(),
+                       [](char c) { return c != kEscape && static_cast<signed char>(c) >= 0; });
 }
 
 /// Decodes with one of Qt's codecs; false when bytes are left that it cannot explain.

@@ -15,7 +15,8 @@ constexpr qint64 kWindow = 16 * 1024;
 
 }  // namespace
 
-BufferedFileProducer::BufferedFileProducer(const char* path) : mWindow(std::make_unique<char[]>(kWindow))
+BufferedFileProducer::BufferedFileProducer(const char* path)
+    : mWindow(std::make_unique<char[]>(kWindow))
 {
     if (const int error = mFile.open(path))
         mStatus = makeOFCondition(OFM_dcmdata, 18, OF_error, std::strerror(error));

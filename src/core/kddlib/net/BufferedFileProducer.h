@@ -3,6 +3,7 @@
 #include "platform/os/RandomAccessFile.h"
 
 #include <dcmtk/config/osconfig.h>
+
 #include <dcmtk/dcmdata/dcistrma.h>
 
 #include <memory>

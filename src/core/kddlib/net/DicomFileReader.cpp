@@ -68,7 +68,12 @@ private:
 class DepthLimitedFileStream : public DcmInputStream
 {
 public:
-    explicit DepthLimitedFileStream(const char* path) : DcmInputStream(&mProducer), mProducer(path), mPath(path) {}
+    explicit DepthLimitedFileStream(const char* path)
+        : DcmInputStream(&mProducer)
+        , mProducer(path)
+        , mPath(path)
+    {
+    }
 
     offile_off_t read(void* buffer, offile_off_t length) override
     {
@@ -81,7 +86,10 @@ public:
 
     OFBool good() const override { return !mTooDeep && DcmInputStream::good(); }
 
-    OFCondition status() const override { return mTooDeep ? OFCondition(EC_NestedTooDeep) : DcmInputStream::status(); }
+    OFCondition status() const override
+    {
+        return mTooDeep ? OFCondition(EC_NestedTooDeep) : DcmInputStream::status();
+    }
 
     /// How DCMTK finds a long value again that it has left in the file. In deflated data no offset leads to it.
     DcmInputStreamFactory* newFactory() const override

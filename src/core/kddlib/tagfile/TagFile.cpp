@@ -11,6 +11,8 @@
 #include <dcmtk/dcmdata/dcdeftag.h>
 #include <dcmtk/dcmdata/dcfilefo.h>
 
+#include <tuple>
+
 namespace Kdd
 {
 
@@ -281,21 +283,21 @@ std::shared_ptr<TagMap> TagFile::study() const
     return mStudies.isEmpty() ? nullptr : mStudies.first();
 }
 
+TagFile::Statistics TagFile::statistics() const
+{
+    return {mSeries.size(), mImages.size(), mNumVolumes,       mNumBlobs,        mOptimiseMs, mReadMs,
+            mWriteMs,       mStoredSize,    mUncompressedSize, mUnoptimisedSize, mBlobBytes};
+}
+
+// NOLINTNEXTLINE(readability-function-size)
 void TagFile::getStatistics(int& series, int& images, int& volumes, int& blobs, int& optimiseMs, int& readMs,
                             int& writeMs, int& storedSize, int& uncompressedSize, int& unoptimisedSize,
                             int& blobBytes) const
 {
-    series = mSeries.size();
-    images = mImages.size();
-    volumes = mNumVolumes;
-    blobs = mNumBlobs;
-    optimiseMs = mOptimiseMs;
-    readMs = mReadMs;
-    writeMs = mWriteMs;
-    storedSize = mStoredSize;
-    uncompressedSize = mUncompressedSize;
-    unoptimisedSize = mUnoptimisedSize;
-    blobBytes = mBlobBytes;
+    std::tie(series, images, volumes, blobs, optimiseMs, readMs, writeMs, storedSize, uncompressedSize,
+             unoptimisedSize, blobBytes) =
+        std::make_tuple(mSeries.size(), mImages.size(), mNumVolumes, mNumBlobs, mOptimiseMs, mReadMs,
+                        mWriteMs, mStoredSize, mUncompressedSize, mUnoptimisedSize, mBlobBytes);
 }
 
 }  // namespace Kdd

@@ -114,6 +114,25 @@ public:
     const QMap<QByteArray, TagMap*>& imagesByUID() const { return mImages; }
 
     /// Counts of the present tree, and times [ms] and sizes [bytes] of its last optimisation, reading and writing.
+    struct Statistics
+    {
+        int series = 0;
+        int images = 0;
+        int volumes = 0;
+        int blobs = 0;
+        int optimiseMs = 0;
+        int readMs = 0;
+        int writeMs = 0;
+        int storedSize = 0;
+        int uncompressedSize = 0;
+        int unoptimisedSize = 0;  ///< before optimisation, uncompressed; only with `kMeasureUnoptimised`
+        int blobBytes = 0;
+    };
+
+    Statistics statistics() const;
+
+    /// The same, one by one.
+    // NOLINTNEXTLINE(readability-function-size): the system's other parts call it in this form
     void getStatistics(int& series, int& images, int& volumes, int& blobs, int& optimiseMs, int& readMs,
                        int& writeMs, int& storedSize, int& uncompressedSize, int& unoptimisedSize,
                        int& blobBytes) const;

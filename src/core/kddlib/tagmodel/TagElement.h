@@ -8,6 +8,7 @@
 
 #include <memory>
 #include <string>
+#include <utility>
 
 class DcmElement;
 class DcmTag;
@@ -36,8 +37,8 @@ class KDD_EXPORT TagElement
 public:
     /// An empty value of VR UN.
     TagElement() = default;
-    TagElement(VrCode vr, const QByteArray& value)
-        : mValue(value)
+    TagElement(VrCode vr, QByteArray value)
+        : mValue(std::move(value))
         , mVr(vr)
     {
     }

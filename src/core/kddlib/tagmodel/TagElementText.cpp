@@ -186,10 +186,10 @@ bool TagElement::putValueAsString(const QByteArray& text)
         mValue = text;
         return true;
     }
-    const auto toFloat = [](const char* word) { return static_cast<float>(std::atof(word)); };
-    const auto toDouble = [](const char* word) { return std::atof(word); };
-    const auto toInt32 = [](const char* word) { return static_cast<qint32>(std::atoi(word)); };
-    const auto toInt16 = [](const char* word) { return static_cast<qint16>(std::atoi(word)); };
+    const auto toFloat = [](const char* word) { return static_cast<float>(std::strtod(word, nullptr)); };
+    const auto toDouble = [](const char* word) { return std::strtod(word, nullptr); };
+    const auto toInt32 = [](const char* word) { return static_cast<qint32>(std::strtol(word, nullptr, 10)); };
+    const auto toInt16 = [](const char* word) { return static_cast<qint16>(std::strtol(word, nullptr, 10)); };
     const auto toUint32 = [](const char* word) {
         return static_cast<quint32>(std::strtoul(word, nullptr, 10));
     };

@@ -159,7 +159,7 @@ public:
     // ---- the merged view in key order
 
     iterator begin() const;
-    iterator end() const;
+    static iterator end();
 
     /// The first entry whose key is not less than `key`.
     iterator lowerBound(const DcmTagKey& key) const;
@@ -266,8 +266,8 @@ private:
     };
 
     void deserialize(KxMsg& in, TagMap* parent, RecordContext& context);
-    std::unique_ptr<TagElement> readSequence(KxMsg& in, const DcmTagKey& key, const TagMap* parent,
-                                             RecordContext& context);
+    static std::unique_ptr<TagElement> readSequence(KxMsg& in, const DcmTagKey& key, const TagMap* parent,
+                                                    RecordContext& context);
 
     TagMap* mParent = nullptr;
     QList<TagMap*> mChildren;

@@ -116,7 +116,7 @@ TagMap* TagMap::createTagMap(DcmItem* item, unsigned int maxLength, int depth)
 
 void TagMap::addObject(DcmObject& object, unsigned int maxLength, int depth)
 {
-    const DcmTagKey key = object.getTag();
+    const DcmTagKey key(object.getGTag(), object.getETag());
     if (key.getGroup() == 0 || key.getElement() == 0)
         return;
     if (object.ident() == EVR_SQ)
@@ -127,7 +127,7 @@ void TagMap::addObject(DcmObject& object, unsigned int maxLength, int depth)
 
 void TagMap::addSequence(DcmSequenceOfItems& sequence, unsigned int maxLength, int depth)
 {
-    const DcmTagKey key = sequence.getTag();
+    const DcmTagKey key(sequence.getGTag(), sequence.getETag());
     const bool isPrivate = (key.getGroup() & 1) != 0;
     if (depth >= kMaxItemDepth) {
         LogFile::warnf("Sequence (%04x,%04x) lies deeper than %d items and is left out",
@@ -142,7 +142,7 @@ void TagMap::addSequence(DcmSequenceOfItems& sequence, unsigned int maxLength, i
 
 void TagMap::addElement(DcmElement& element, unsigned int maxLength)
 {
-    const DcmTagKey key = element.getTag();
+    const DcmTagKey key(element.getGTag(), element.getETag());
     auto copy = std::make_unique<TagElement>(VrCode::Omitted, QByteArray());
     if (!isLongerThan(element, hasLargeBound(key) ? kLargeValueBound : maxLength)) {
         const OFCondition condition = copyValue(element, *copy);
@@ -191,7 +191,7 @@ void TagMap::insertInto(DcmItem& item) const
             continue;
         std::unique_ptr<DcmElement> element(it.value()->createDcmElement(it.key()));
         if (element != nullptr && item.insert(element.get()).good())
-            element.release();
+            static_cast<void>(element.release());
     }
 }
 

@@ -68,7 +68,7 @@ TagMap::iterator TagMap::begin() const
     return it;
 }
 
-TagMap::iterator TagMap::end() const
+TagMap::iterator TagMap::end()
 {
     return {};
 }

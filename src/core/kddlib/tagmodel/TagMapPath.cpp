@@ -24,8 +24,8 @@ const TagMap* itemOf(const TagMap& node, const QString& part)
     if (element == nullptr || !element->isSequence())
         return nullptr;
     const auto* sequence = static_cast<const TagSequence*>(element);
-    const int index = std::atoi(part.mid(bracket + 1).toLatin1().constData());
-    return index >= 0 && index < sequence->numItems() ? sequence->item(index) : nullptr;
+    const long index = std::strtol(part.mid(bracket + 1).toLatin1().constData(), nullptr, 10);
+    return index >= 0 && index < sequence->numItems() ? sequence->item(static_cast<int>(index)) : nullptr;
 }
 
 }  // namespace
