@@ -108,31 +108,41 @@ bool itemsDeclareCharacterSets(DcmItem& item)
     return found;
 }
 
-void convertElement(DcmElement& element, const QByteArray& characterSet)
+bool convertElement(DcmElement& element, const QByteArray& characterSet)
 {
     char* text = nullptr;
     if (!DcmVR(element.getVR()).isaString() || element.getString(text).bad() || text == nullptr)
-        return;
+        return false;
     const QByteArray bytes(text);
-    if (!isAscii(bytes))
-        element.putString(decodeText(bytes, characterSet).toUtf8().constData());
+    if (isAscii(bytes))
+        return false;
+    const QByteArray converted = decodeText(bytes, characterSet).toUtf8();
+    element.putString(converted.constData());
+    return converted != bytes;
 }
 
-/// Value by value, so that one that does not fit leaves the others right.
-void convertItem(DcmItem& item, const OFString& inherited)
+/// Value by value, so that one that does not fit leaves the others right. Whether anything has changed.
+bool convertItem(DcmItem& item, const OFString& inherited)
 {
     OFString characterSet;
-    const bool declares = declaresCharacterSet(item, characterSet);
-    if (!declares)
+    if (!declaresCharacterSet(item, characterSet))
         characterSet = inherited;
-    for (DcmObject* object = item.nextInContainer(nullptr); object != nullptr;
-         object = item.nextInContainer(object)) {
+    bool hasChanged = false;
+    for (DcmObject* object = item.nextInContainer(nullptr); object != nullptr; object = item.nextInContainer(object)) {
         if (object->ident() != EVR_SQ)
-            convertElement(static_cast<DcmElement&>(*object), QByteArray::fromStdString(characterSet));
+            hasChanged |= convertElement(static_cast<DcmElement&>(*object), QByteArray::fromStdString(characterSet));
     }
-    forItems(item, [&](DcmItem& below) { convertItem(below, characterSet); });
-    if (declares)
-        item.putAndInsertString(DCM_SpecificCharacterSet, kUtf8CharacterSet);
+    forItems(item, [&](DcmItem& below) { hasChanged |= convertItem(below, characterSet); });
+    return hasChanged;
+}
+
+void declareUtf8InItems(DcmItem& item)
+{
+    forItems(item, [](DcmItem& below) {
+        if (below.tagExists(DCM_SpecificCharacterSet))
+            below.putAndInsertString(DCM_SpecificCharacterSet, kUtf8CharacterSet);
+        declareUtf8InItems(below);
+    });
 }
 
 }  // namespace
@@ -164,8 +174,10 @@ bool convertToUtf8(DcmItem& dataset)
 
 void convertValuesToUtf8(DcmItem& dataset)
 {
-    convertItem(dataset, OFString());
+    if (!convertItem(dataset, OFString()))
+        return;
     dataset.putAndInsertString(DCM_SpecificCharacterSet, kUtf8CharacterSet);
+    declareUtf8InItems(dataset);
 }
 
 }  // namespace Kdd

@@ -20,7 +20,7 @@ KDD_EXPORT QString decodeText(const QByteArray& bytes, const QByteArray& charact
 bool convertToUtf8(DcmItem& dataset);
 
 /// Converts every value on its own, as `decodeText` does, by the character set of its item. Values that are UTF-8
-/// already stay as they are.
+/// already stay as they are; where nothing changes the declared character sets stay as well.
 void convertValuesToUtf8(DcmItem& dataset);
 
 }  // namespace Kdd
