@@ -107,6 +107,7 @@ std::string formatted(const char* format, va_list arguments)
 {
     va_list again;
     va_copy(again, arguments);
+    // NOLINTNEXTLINE(clang-analyzer-valist.Uninitialized): the caller has started the list
     const int length = std::vsnprintf(nullptr, 0, format, arguments);
     std::string text(length > 0 ? static_cast<std::size_t>(length) : 0, '\0');
     if (length > 0)

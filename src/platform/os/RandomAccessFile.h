@@ -1,12 +1,14 @@
 #pragma once
 
+#include "platform/base/Export.h"
+
 #include <QtGlobal>
 
 namespace Kdd
 {
 
 /// A file read at any place, without a position of its own. Closed when the object goes.
-class RandomAccessFile
+class KDD_EXPORT RandomAccessFile
 {
 public:
     RandomAccessFile() = default;

@@ -68,12 +68,11 @@ public:
         case DicomInput::Kind::NotDicom:
             ++mSkipped;
             if (mOptions.verbose)
-                LogFile::printf("Skipped %s: %s", qUtf8Printable(input.path), qUtf8Printable(input.reason));
+                LogFile::printf("Skipped %s: %s", input.path.constData(), qUtf8Printable(input.reason));
             break;
         case DicomInput::Kind::Unusable:
             fail();
-            LogFile::errorf("Could not take %s: %s", qUtf8Printable(input.path),
-                            qUtf8Printable(input.reason));
+            LogFile::errorf("Could not take %s: %s", input.path.constData(), qUtf8Printable(input.reason));
             break;
         }
     }
@@ -107,7 +106,7 @@ private:
 void Adder::place(DicomInput& input)
 {
     PendingStudy& study = mPending[input.studyUID];
-    const QByteArray path = input.path.toLocal8Bit();
+    const QByteArray& path = input.path;
     const int before = study.file.imagesByUID().size();
     // The last of several files of one instance is kept, as when they are added one after the other.
     TagMap* image = study.file.addTagMap(input.map.release(), path.constData(), true);
@@ -194,18 +193,18 @@ Outcome Adder::report() const
     return mFailed == 0 ? Outcome::Done : Outcome::Failed;
 }
 
-std::vector<DicomInput> readSome(const QStringList& paths)
+std::vector<DicomInput> readSome(const QList<QByteArray>& paths)
 {
     std::vector<DicomInput> inputs;
     inputs.reserve(static_cast<std::size_t>(paths.size()));
-    for (const QString& path : paths)
+    for (const QByteArray& path : paths)
         inputs.push_back(readDicomInput(path));
     return inputs;
 }
 
 /// Reads the files on as many threads as there are cores and hands them on in their order.
 template <typename Take>
-void readAll(const QStringList& files, Take take)
+void readAll(const QList<QByteArray>& files, Take take)
 {
     const unsigned ahead = qMax(1U, std::thread::hardware_concurrency());
     std::deque<std::future<std::vector<DicomInput>>> running;
@@ -223,10 +222,10 @@ void readAll(const QStringList& files, Take take)
 
 }  // namespace
 
-Outcome runAdd(const GlobalOptions& options, const QStringList& paths)
+Outcome runAdd(const GlobalOptions& options, const QList<QByteArray>& paths)
 {
     QStringList faults;
-    const QStringList files = filesBelow(paths, faults);
+    const QList<QByteArray> files = filesBelow(paths, faults);
     Adder adder(options);
     for (const QString& fault : qAsConst(faults)) {
         LogFile::errorf("Could not look into %s", qUtf8Printable(fault));

@@ -3,7 +3,6 @@
 #include <QByteArray>
 #include <QList>
 #include <QString>
-#include <QStringList>
 
 namespace Kdd
 {
@@ -51,7 +50,7 @@ struct SampleRequest
     unsigned seed = 1;
 };
 
-Outcome runAdd(const GlobalOptions& options, const QStringList& paths);
+Outcome runAdd(const GlobalOptions& options, const QList<QByteArray>& paths);
 Outcome runList(const GlobalOptions& options);
 Outcome runShow(const GlobalOptions& options, const ShowOptions& show);
 Outcome runMetadata(const GlobalOptions& options, const NodeSelection& selection);

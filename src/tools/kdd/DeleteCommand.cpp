@@ -1,3 +1,4 @@
+#include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
 #include "tools/kdd/Commands.h"
 #include "tools/kdd/Report.h"
@@ -11,9 +12,16 @@ namespace Kdd
 namespace
 {
 
+bool isInSeries(const TagMap* image, const QByteArray& seriesUID)
+{
+    return image != nullptr && (seriesUID.isEmpty() || image->uid(TagMap::SeriesLevel) == seriesUID);
+}
+
 /// Takes what is selected out of the file held open; the number of nodes removed.
 int removeSelected(const NodeSelection& selection, TagFile& file)
 {
+    if (!selection.image.isEmpty() && !isInSeries(file.findImage(selection.image), selection.series))
+        return 0;
     const char* image = selection.image.constData();
     const char* series = selection.series.constData();
     if (!selection.image.isEmpty())

@@ -3,16 +3,15 @@
 #include "kddlib/Limits.h"
 #include "kddlib/net/DicomFileReader.h"
 #include "kddlib/tagmodel/TagMap.h"
-
-#include <QDir>
-#include <QFile>
-#include <QFileInfo>
+#include "platform/os/RandomAccessFile.h"
 
 #include <dcmtk/dcmdata/dctk.h>
 
 #include <algorithm>
-#include <cerrno>
 #include <cstring>
+#include <filesystem>
+#include <system_error>
+#include <vector>
 
 namespace Kdd
 {
@@ -34,9 +33,11 @@ DicomInput& refuse(DicomInput& input, DicomInput::Kind kind, const QString& reas
     return input;
 }
 
-bool hasDicomPrefix(QFile& file)
+bool hasDicomPrefix(const RandomAccessFile& file)
 {
-    return file.seek(kPreamble) && file.read(4) == "DICM";
+    char prefix[4] = {};
+    return file.readAt(kPreamble, prefix, sizeof prefix) == sizeof prefix &&
+           std::memcmp(prefix, "DICM", 4) == 0;
 }
 
 bool isMediaDirectory(DcmFileFormat& file)
@@ -61,19 +62,11 @@ bool isStrange(const QByteArray& uid)
 /// The first of the three UIDs that cannot be used as a name; null when all can.
 const char* strangeUid(const TagMap& map)
 {
-    const struct
-    {
-        DcmTagKey key;
-        const char* name;
-    } uids[] = {{DCM_StudyInstanceUID, "Study Instance UID"},
-                {DCM_SeriesInstanceUID, "Series Instance UID"},
-                {DCM_SOPInstanceUID, "SOP Instance UID"}};
-    for (const auto& uid : uids) {
-        QByteArray text;
-        if (map.findAndGetString(uid.key, text) && isStrange(text))
-            return uid.name;
-    }
-    return nullptr;
+    if (isStrange(map.uid(TagMap::StudyLevel)))
+        return "Study Instance UID";
+    if (isStrange(map.uid(TagMap::SeriesLevel)))
+        return "Series Instance UID";
+    return isStrange(map.uid(TagMap::ImageLevel)) ? "SOP Instance UID" : nullptr;
 }
 
 /// Without the DICM prefix nearly any bytes can be read as some attribute, so an object has to name itself.
@@ -115,29 +108,49 @@ DicomInput& take(DicomInput& input, DcmFileFormat& file)
         return refuse(input, DicomInput::Kind::Unusable,
                       QStringLiteral("%1 has bytes that no UID has").arg(QLatin1String(name)));
     }
-    input.map->findAndGetString(DCM_StudyInstanceUID, input.studyUID);
+    input.studyUID = input.map->uid(TagMap::StudyLevel);
     input.kind = DicomInput::Kind::Image;
     return input;
 }
 
-void collect(const QFileInfo& place, QStringList& files, QStringList& faults)
+QByteArray bytes(const std::filesystem::path& path)
 {
-    if (!place.isDir()) {
-        files.append(place.absoluteFilePath());
-        return;
-    }
-    const QDir folder(place.absoluteFilePath());
-    if (!folder.isReadable()) {
-        faults.append(QStringLiteral("%1: %2").arg(place.filePath(), errnoText(EACCES)));
-        return;
-    }
-    const QDir::Filters wanted =
-        QDir::Files | QDir::Dirs | QDir::System | QDir::Hidden | QDir::NoDotAndDotDot;
-    for (const QFileInfo& entry : folder.entryInfoList(wanted, QDir::Name)) {
+    return QByteArray::fromStdString(path.native());
+}
+
+QString fault(const std::filesystem::path& path, const std::error_code& error)
+{
+    return QStringLiteral("%1: %2").arg(QString::fromLocal8Bit(bytes(path)),
+                                        QString::fromStdString(error.message()));
+}
+
+void collect(const std::filesystem::path& place, QList<QByteArray>& files, QStringList& faults);
+
+void collectBelow(const std::filesystem::path& folder, QList<QByteArray>& files, QStringList& faults)
+{
+    std::error_code error;
+    std::vector<std::filesystem::path> entries;
+    for (std::filesystem::directory_iterator it(folder, error), end; !error && it != end; it.increment(error))
+        entries.push_back(it->path());
+    if (error)
+        faults.append(fault(folder, error));
+    std::sort(entries.begin(), entries.end());
+    for (const std::filesystem::path& entry : entries) {
         // A linked folder may lead back up; linked files are welcome.
-        if (entry.isFile() || (entry.isDir() && !entry.isSymLink()) || (entry.isSymLink() && !entry.exists()))
+        if (!std::filesystem::is_symlink(entry, error) || !std::filesystem::is_directory(entry, error))
             collect(entry, files, faults);
     }
+}
+
+/// Pipes, sockets and devices are no files; a link that leads nowhere is taken for one, so that its reading tells.
+void collect(const std::filesystem::path& place, QList<QByteArray>& files, QStringList& faults)
+{
+    std::error_code error;
+    const std::filesystem::file_status status = std::filesystem::status(place, error);
+    if (std::filesystem::is_directory(status))
+        collectBelow(place, files, faults);
+    else if (!std::filesystem::is_other(status))
+        files.append(bytes(std::filesystem::absolute(place).lexically_normal()));
 }
 
 }  // namespace
@@ -147,20 +160,19 @@ DicomInput::DicomInput(DicomInput&&) noexcept = default;
 DicomInput& DicomInput::operator=(DicomInput&&) noexcept = default;
 DicomInput::~DicomInput() = default;
 
-DicomInput readDicomInput(const QString& path)
+DicomInput readDicomInput(const QByteArray& path)
 {
     DicomInput input;
     input.path = path;
-    QFile file(path);
-    if (!file.open(QIODevice::ReadOnly))
-        return std::move(refuse(input, DicomInput::Kind::Unusable, file.errorString()));
+    RandomAccessFile file;
+    if (const int error = file.open(path.constData()))
+        return std::move(refuse(input, DicomInput::Kind::Unusable, errnoText(error)));
     input.fileBytes = file.size();
     if (input.fileBytes == 0)
         return std::move(refuse(input, DicomInput::Kind::Unusable, QStringLiteral("The file is empty")));
     const bool isDicom = hasDicomPrefix(file);
-    file.close();
     DcmFileFormat format;
-    const OFCondition condition = readDicomFile(path.toLocal8Bit().constData(), format);
+    const OFCondition condition = readDicomFile(path.constData(), format);
     if (condition.bad() || (!isDicom && !namesItself(*format.getDataset())))
         return std::move(refuse(input, isDicom ? DicomInput::Kind::Unusable : DicomInput::Kind::NotDicom,
                                 condition.bad() ? QString::fromLatin1(condition.text())
@@ -170,15 +182,17 @@ DicomInput readDicomInput(const QString& path)
     return std::move(take(input, format));
 }
 
-QStringList filesBelow(const QStringList& paths, QStringList& faults)
+QList<QByteArray> filesBelow(const QList<QByteArray>& paths, QStringList& faults)
 {
-    QStringList files;
-    for (const QString& path : paths) {
-        const QFileInfo place(path);
-        if (place.exists() || place.isSymLink())
+    QList<QByteArray> files;
+    for (const QByteArray& path : paths) {
+        const std::filesystem::path place(path.toStdString());
+        std::error_code error;
+        if (std::filesystem::exists(std::filesystem::symlink_status(place, error)))
             collect(place, files, faults);
         else
-            faults.append(QStringLiteral("%1: %2").arg(path, errnoText(ENOENT)));
+            faults.append(
+                fault(place, error ? error : std::make_error_code(std::errc::no_such_file_or_directory)));
     }
     return files;
 }

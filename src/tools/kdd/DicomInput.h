@@ -1,6 +1,7 @@
 #pragma once
 
 #include <QByteArray>
+#include <QList>
 #include <QString>
 #include <QStringList>
 
@@ -21,7 +22,7 @@ struct DicomInput
     };
 
     Kind kind = Kind::NotDicom;
-    QString path;
+    QByteArray path;
     QString reason;               ///< of anything but an image
     std::unique_ptr<TagMap> map;  ///< parentless
     QByteArray studyUID;
@@ -36,10 +37,11 @@ struct DicomInput
 
 /// Reads one file. Media directories (DICOMDIR) count as not DICOM: they describe files, not patients. May be called
 /// on several threads at once.
-DicomInput readDicomInput(const QString& path);
+DicomInput readDicomInput(const QByteArray& path);
 
-/// The files at and below the paths, sorted within each folder. Paths that do not exist or cannot be entered are put
-/// into `faults` with the reason.
-QStringList filesBelow(const QStringList& paths, QStringList& faults);
+/// The files at and below the paths, absolute and sorted within each folder. Paths that do not exist and folders that
+/// cannot be entered are put into `faults` with the reason. Paths are bytes: a name that is no text in the present
+/// locale is a file like any other.
+QList<QByteArray> filesBelow(const QList<QByteArray>& paths, QStringList& faults);
 
 }  // namespace Kdd

@@ -32,9 +32,10 @@ bool readNamed(const QString& name, TagFile& file)
         return readStudy(name.toLocal8Bit(), file);
     if (isTagFile(name))
         return readStudyFile(name, file);
-    DicomInput input = readDicomInput(name);
+    const QByteArray path = name.toLocal8Bit();
+    DicomInput input = readDicomInput(path);
     if (input.kind == DicomInput::Kind::Image)
-        return file.addTagMap(input.map.release(), name.toLocal8Bit().constData(), true) != nullptr;
+        return file.addTagMap(input.map.release(), path.constData(), true) != nullptr;
     LogFile::errorf("Could not load %s: %s", qUtf8Printable(name), qUtf8Printable(input.reason));
     return false;
 }

@@ -13,8 +13,12 @@ QStringList storedTagFiles()
     QStringList paths;
     QDirIterator files(QString::fromLocal8Bit(TagFile::metaFolder()), {QStringLiteral("*.tc")}, QDir::Files,
                        QDirIterator::Subdirectories);
-    while (files.hasNext())
-        paths.append(files.next());
+    while (files.hasNext()) {
+        files.next();
+        // One without content is just being made.
+        if (files.fileInfo().size() > 0)
+            paths.append(files.filePath());
+    }
     paths.sort();
     return paths;
 }
@@ -26,7 +30,8 @@ bool resolveStudy(const QByteArray& text, QByteArray& studyUID)
         return true;
     }
     QList<QByteArray> found;
-    for (const QString& path : storedTagFiles()) {
+    // Every UID begins with nothing, but whoever names nothing has not chosen a study.
+    for (const QString& path : text.isEmpty() ? QStringList() : storedTagFiles()) {
         TagFile file;
         if (file.readCacheFile(path, nullptr, false) && file.studyInstanceUID().startsWith(text))
             found.append(file.studyInstanceUID());
@@ -34,7 +39,7 @@ bool resolveStudy(const QByteArray& text, QByteArray& studyUID)
     if (found.size() == 1)
         studyUID = found.first();
     else if (found.isEmpty())
-        LogFile::errorf("No study is named %s", text.constData());
+        LogFile::errorf("No study is named \"%s\"", text.constData());
     else
         LogFile::errorf("%d studies begin with %s", found.size(), text.constData());
     return found.size() == 1;

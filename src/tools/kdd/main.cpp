@@ -29,6 +29,15 @@ struct StoreOptions
     bool flush = false;
 };
 
+/// A result that could not be written is none.
+Outcome whenWritten(Outcome outcome)
+{
+    if (std::fflush(stdout) == 0 && std::ferror(stdout) == 0)
+        return outcome;
+    LogFile::errorf("Standard output cannot be written");
+    return Outcome::Failed;
+}
+
 /// The command chosen, ready to run once the global options are in force.
 using Command = std::function<Outcome()>;
 
@@ -129,9 +138,9 @@ private:
     {
         declare("add", "Take the DICOM files below the paths into the tag files of their studies",
                 [this] {
-                    QStringList paths;
+                    QList<QByteArray> paths;
                     for (const std::string& text : mPaths)
-                        paths.append(path(text));
+                        paths.append(bytes(text));
                     return runAdd(mGlobal, paths);
                 })
             .add_option("PATH", mPaths, "Files and folders")
@@ -218,7 +227,7 @@ Outcome run(int argc, char** argv)
         return Outcome::WrongUsage;
     }
     applyStore(global, store);
-    return chosen();
+    return whenWritten(chosen());
 }
 
 }  // namespace

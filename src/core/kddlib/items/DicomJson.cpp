@@ -18,80 +18,28 @@ namespace Kdd
 namespace
 {
 
-/// The VR that an element had in its dataset. Two stored codes stand for younger VRs as well, and the dictionary
-/// tells which one it was.
-DcmTag tagOf(const DcmTagKey& key, const TagElement& element)
-{
-    if (element.vr() == VrCode::UT || element.vr() == VrCode::UN || element.markedAsOmitted()) {
-        const DcmTag known(key);
-        if (element.markedAsOmitted())
-            return known.getEVR() == EVR_UNKNOWN ? DcmTag(key, EVR_UN) : known;
-        switch (known.getEVR()) {
-        case EVR_UC:
-        case EVR_UR:
-        case EVR_OD:
-        case EVR_OL:
-        case EVR_OV:
-        case EVR_SV:
-        case EVR_UV:
-            if (vrCodeOf(known.getEVR()) == element.vr())
-                return known;
-            break;
-        default:
-            break;
-        }
-    }
-    return {key, evrOf(element.vr())};
-}
-
-void fill(DcmItem& item, const TagMap& map);
-
-std::unique_ptr<DcmElement> newSequence(const DcmTagKey& key, const TagSequence& source)
-{
-    auto sequence = std::make_unique<DcmSequenceOfItems>(DcmTag(key, EVR_SQ));
-    for (int i = 0; i < source.numItems(); ++i) {
-        auto* item = new DcmItem;
-        sequence->append(item);
-        fill(*item, *source.item(i));
-    }
-    return sequence;
-}
-
 bool isWritten(const DcmTagKey& key)
 {
     return key.getGroup() != 0x0006;
 }
 
-/// Rebuilds the dataset with the VRs it had, without what was omitted.
-void fill(DcmItem& item, const TagMap& map)
-{
-    const TagMap::iterator end = map.end();
-    for (TagMap::iterator it = map.begin(); it != end; ++it) {
-        const TagElement& source = *it.value();
-        if (source.markedAsOmitted() || !isWritten(it.key()))
-            continue;
-        std::unique_ptr<DcmElement> element =
-            source.isSequence() ? newSequence(it.key(), static_cast<const TagSequence&>(source))
-                                : source.newDcmElement(tagOf(it.key(), source));
-        if (element != nullptr && item.insert(element.get()).good())
-            static_cast<void>(element.release());
-    }
-}
-
 std::unique_ptr<DcmDataset> rebuilt(const TagMap& map)
 {
     auto dataset = std::make_unique<DcmDataset>();
-    fill(*dataset, map);
+    map.insertInto(*dataset);
     return dataset;
 }
 
 std::unique_ptr<DcmDataset> utf8Dataset(const TagMap& map)
 {
     std::unique_ptr<DcmDataset> dataset = rebuilt(map);
-    if (!convertToUtf8(*dataset))
+    const bool isConverted = convertToUtf8(*dataset);
+    if (!isConverted)
         dataset = rebuilt(map);
     // What declares itself as UTF-8 was not looked at, and JSON is UTF-8 by definition.
-    convertValuesToUtf8(*dataset);
+    const bool hasChanged = convertValuesToUtf8(*dataset);
+    if (!isConverted && !hasChanged)
+        declareUtf8(*dataset);
     return dataset;
 }
 
@@ -117,6 +65,8 @@ public:
             const DcmTagKey key(next->getGTag(), next->getETag());
             for (; source != end && source.key() < key; ++source)
                 omitted(source, address, isFirst);
+            if (!isWritten(key))
+                continue;
             const bool isFromMap = source != end && source.key() == key;
             separate(isFirst);
             if (isFromMap && source.value()->isSequence())
@@ -152,7 +102,8 @@ private:
             return;
         separate(isFirst);
         const std::string key = name(source.key());
-        DcmVR vr(tagOf(source.key(), *source.value()).getEVR());
+        // The value's own VR went with it.
+        const DcmVR vr(DcmTag(source.key()).getEVR());
         mOut << '"' << key << "\":{\"vr\":\"" << vr.getValidVRName() << "\",\"BulkDataURI\":";
         DcmJsonFormat::printString(mOut, address + '/' + key);
         mOut << '}';

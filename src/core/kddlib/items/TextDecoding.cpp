@@ -128,9 +128,11 @@ bool convertItem(DcmItem& item, const OFString& inherited)
     if (!declaresCharacterSet(item, characterSet))
         characterSet = inherited;
     bool hasChanged = false;
-    for (DcmObject* object = item.nextInContainer(nullptr); object != nullptr; object = item.nextInContainer(object)) {
+    for (DcmObject* object = item.nextInContainer(nullptr); object != nullptr;
+         object = item.nextInContainer(object)) {
         if (object->ident() != EVR_SQ)
-            hasChanged |= convertElement(static_cast<DcmElement&>(*object), QByteArray::fromStdString(characterSet));
+            hasChanged |=
+                convertElement(static_cast<DcmElement&>(*object), QByteArray::fromStdString(characterSet));
     }
     forItems(item, [&](DcmItem& below) { hasChanged |= convertItem(below, characterSet); });
     return hasChanged;
@@ -172,12 +174,19 @@ bool convertToUtf8(DcmItem& dataset)
     return !itemsDeclareCharacterSets(dataset) && dataset.convertToUTF8().good();
 }
 
-void convertValuesToUtf8(DcmItem& dataset)
+bool convertValuesToUtf8(DcmItem& dataset)
 {
     if (!convertItem(dataset, OFString()))
-        return;
+        return false;
     dataset.putAndInsertString(DCM_SpecificCharacterSet, kUtf8CharacterSet);
     declareUtf8InItems(dataset);
+    return true;
+}
+
+void declareUtf8(DcmItem& dataset)
+{
+    if (dataset.convertToUTF8().good())
+        declareUtf8InItems(dataset);
 }
 
 }  // namespace Kdd

@@ -20,7 +20,11 @@ KDD_EXPORT QString decodeText(const QByteArray& bytes, const QByteArray& charact
 bool convertToUtf8(DcmItem& dataset);
 
 /// Converts every value on its own, as `decodeText` does, by the character set of its item. Values that are UTF-8
-/// already stay as they are; where nothing changes the declared character sets stay as well.
-void convertValuesToUtf8(DcmItem& dataset);
+/// already stay as they are; where nothing changes the declared character sets stay as well. Whether
+/// anything has changed.
+bool convertValuesToUtf8(DcmItem& dataset);
+
+/// Declares UTF-8 throughout a dataset of nothing but ASCII, unless it declares what no one knows.
+void declareUtf8(DcmItem& dataset);
 
 }  // namespace Kdd

@@ -22,13 +22,6 @@ namespace
 const DcmTagKey kFilePath(0x0006, 0x7100);
 const DcmTagKey kSuffix(0x0006, 0x7101);
 
-QByteArray textOf(const TagMap& map, const DcmTagKey& key)
-{
-    QByteArray text;
-    map.findAndGetString(key, text);
-    return text;
-}
-
 }  // namespace
 
 TagFile::CompressionMode TagFile::sCompressionMode = CompressionMode::Zlib;
@@ -65,15 +58,19 @@ void TagFile::setMetaFolder(const char* path)
 /// The name under which an image is indexed: its SOP Instance UID, and where it has none its file path.
 QByteArray TagFile::imageKey(const TagMap& image)
 {
-    const QByteArray sopUID = textOf(image, DCM_SOPInstanceUID);
-    return sopUID.isEmpty() ? textOf(image, kFilePath) : sopUID;
+    const QByteArray sopUID = image.uid(TagMap::ImageLevel);
+    if (!sopUID.isEmpty())
+        return sopUID;
+    QByteArray path;
+    image.findAndGetString(kFilePath, path);
+    return path;
 }
 
 TagMap* TagFile::addTagMap(TagMap* map, const char* path, bool replace)
 {
     std::unique_ptr<TagMap> image(map);
-    const QByteArray studyUID = textOf(*image, DCM_StudyInstanceUID);
-    const QByteArray seriesUID = textOf(*image, DCM_SeriesInstanceUID);
+    const QByteArray studyUID = image->uid(TagMap::StudyLevel);
+    const QByteArray seriesUID = image->uid(TagMap::SeriesLevel);
     QByteArray key = imageKey(*image);
     const bool isKnownByPath = key.isEmpty() && path != nullptr;
     if (isKnownByPath)
@@ -218,14 +215,14 @@ void TagFile::dropImage(TagMap* image)
 /// A node that is deleted takes itself out of its parent.
 void TagFile::dropSeries(TagMap* series)
 {
-    mSeries.remove(textOf(*series, DCM_SeriesInstanceUID));
+    mSeries.remove(series->uid(TagMap::SeriesLevel));
     delete series;
 }
 
 void TagFile::dropStudyIfEmpty(TagMap* study)
 {
     if (study->children().isEmpty())
-        mStudies.remove(textOf(*study, DCM_StudyInstanceUID));
+        mStudies.remove(study->uid(TagMap::StudyLevel));
 }
 
 void TagFile::deleteEmptyNodes()

@@ -10,6 +10,7 @@
 #include <QDir>
 #include <QFileInfo>
 
+#include <cerrno>
 #include <cstring>
 
 namespace Kdd
@@ -85,7 +86,13 @@ bool TagFile::openForReading(const QString& path, bool keepOpen)
             LogFile::warnf("Could not open %s: %s", qUtf8Printable(path), qUtf8Printable(reason));
         return fail(reason);
     }
-    if (!hasJournal(path))
+    const bool isWhole = !hasJournal(path);
+    // Its maker has not come to filling it yet, so the study has no tag file at this moment.
+    if (isWhole && mCacheFile.size() == 0) {
+        mCacheFile.close();
+        return fail(systemText(ENOENT));
+    }
+    if (isWhole)
         return true;
     mCacheFile.close();
     if (openWhole(path))

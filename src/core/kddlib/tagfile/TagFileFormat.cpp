@@ -10,8 +10,6 @@
 
 #include <QDataStream>
 
-#include <dcmtk/dcmdata/dcdeftag.h>
-
 #include <cstring>
 #include <limits>
 
@@ -242,8 +240,7 @@ private:
             return true;
         auto study = std::make_shared<TagMap>();
         study->deserialize(record, nullptr, mContext);
-        QByteArray uid;
-        study->findAndGetString(DCM_StudyInstanceUID, uid);
+        const QByteArray uid = study->uid(TagMap::StudyLevel);
         if (record.failed() || (mWanted != nullptr && uid != mWanted))
             return !record.failed();
         mStudy = study.get();
@@ -254,8 +251,7 @@ private:
     bool takeSeries(KxMsg& record)
     {
         mSeries = readBelow(record, mStudy);
-        QByteArray uid;
-        mSeries->findAndGetString(DCM_SeriesInstanceUID, uid);
+        const QByteArray uid = mSeries->uid(TagMap::SeriesLevel);
         // Two series of one UID are no tree that was ever written.
         if (record.failed() || mFile.mSeries.contains(uid))
             return false;

@@ -50,8 +50,8 @@ bool TagFile::openForMerge(QFile& file, const QString& path)
 {
     LockedOpenResult opened =
         openLockedFile(file, path, FileLock::Exclusive, IfAbsent::Create, kMergePolling);
-    if (opened.failure == OpenFailure::NotFound) {
-        const QString folder = QFileInfo(path).path();
+    const QString folder = QFileInfo(path).path();
+    if (!opened && !QDir(folder).exists()) {
         if (!QDir().mkpath(folder))
             return failMerge(QString::asprintf("Could not create meta folder %s", qUtf8Printable(folder)));
         opened = openLockedFile(file, path, FileLock::Exclusive, IfAbsent::Create, kMergePolling);
@@ -89,8 +89,10 @@ void TagFile::mergeFresh(const Indexes& fresh)
     for (auto it = fresh.series.cbegin(); it != fresh.series.cend(); ++it)
         mergeSeries(it.value(), it.key(), freshStudy, study);
     deleteEmptyNodes();
-    for (const QByteArray& seriesUID : fresh.series.keys())
-        mSeries.value(seriesUID)->optimizeAll();
+    for (auto it = fresh.series.cbegin(); it != fresh.series.cend(); ++it) {
+        if (TagMap* series = mSeries.value(it.key(), nullptr))
+            series->optimizeAll();
+    }
     study.optimizeAll();
 }
 

@@ -44,7 +44,7 @@ void writeValue(KxMsg& out, const QByteArray& value)
 /// What follows in the record goes by the VR, so the VR has to go by what the element really is.
 VrCode storedVr(const TagElement& element)
 {
-    if (element.isSequence())
+    if (element.isSequence() && !element.markedAsMissing() && !element.markedAsOmitted())
         return VrCode::SQ;
     return element.vr() == VrCode::SQ ? VrCode::UN : element.vr();
 }
@@ -154,7 +154,8 @@ std::unique_ptr<TagElement> TagMap::readSequence(KxMsg& in, const DcmTagKey& key
 {
     const int count = readLength(in);
     // Every item takes at least its own length code.
-    if (context.depth >= kMaxItemDepth || count < 0 || count > in.remaining() / kShortLength) {
+    if (context.depth >= kMaxItemDepth || count < 0 || count > in.remaining() / kShortLength ||
+        count > context.elementsLeft) {
         in.setFailed();
         return nullptr;
     }

@@ -50,9 +50,8 @@ public:
     /// null, one line "VR [text] <> [text]" is appended to it.
     virtual bool compare(const TagElement& other, bool checkVR, std::string* diffs) const;
 
-    /// A new DCMTK element of this value, or null when the VR has none (a sequence that is no `TagSequence`, the
-    /// markers). The caller owns it. The dictionary settles the VR of a key that it knows; another key gets the VR
-    /// of this element.
+    /// A new DCMTK element of this value under `tagFor(key)`, or null when the VR has none (a sequence that is no
+    /// `TagSequence`, the markers). The caller owns it.
     virtual DcmElement* createDcmElement(const DcmTagKey& key) const;
 
     /// A new element with the same value and VR and counters at 0; the caller owns it.
@@ -60,6 +59,11 @@ public:
 
     /// Whether this is a `TagSequence`.
     virtual bool isSequence() const { return false; }
+
+    /// The tag of the attribute with the VR that it had in its dataset: the dictionary's where that agrees with what is
+    /// stored (which tells the younger VRs apart), else the stored one. DCMTK goes by the tag when it writes: under
+    /// the dictionary's VR alone a signed number would come out unsigned and a private value without its VR.
+    DcmTag tagFor(const DcmTagKey& key) const;
 
     /// As `createDcmElement`, with the VR that the tag carries.
     std::unique_ptr<DcmElement> newDcmElement(const DcmTag& tag) const;

@@ -117,15 +117,19 @@ std::unique_ptr<DcmElement> bytesElement(VrCode vr, const DcmTag& tag, const QBy
 
 }  // namespace
 
-DcmElement* TagElement::createDcmElement(const DcmTagKey& key) const
+DcmTag TagElement::tagFor(const DcmTagKey& key) const
 {
-    DcmTag tag(key);
-    // Without a VR of its own DCMTK would write a private word array as empty and a private value as UN.
-    if (tag.getEVR() == EVR_UNKNOWN)
-        tag.setVR(DcmVR(evrOf(mVr)));
-    return newDcmElement(tag).release();
+    DcmTag known(key);
+    const bool isThis = known.getEVR() != EVR_UNKNOWN && vrCodeOf(known.getEVR()) == mVr;
+    return isThis ? known : DcmTag(key, evrOf(mVr));
 }
 
+DcmElement* TagElement::createDcmElement(const DcmTagKey& key) const
+{
+    return newDcmElement(tagFor(key)).release();
+}
+
+// NOLINTNEXTLINE(readability-function-size): a table
 std::unique_ptr<DcmElement> TagElement::newDcmElement(const DcmTag& tag) const
 {
     switch (mVr) {

@@ -125,6 +125,10 @@ public:
     /// The creator text of a private key's block, or null. Owned by the creator element.
     const char* privateCreator(const DcmTagKey& key) const;
 
+    /// The UID that this node shows for a level; empty when it has none. A few writers store every attribute as UN,
+    /// UIDs included; they are read as what they are.
+    QByteArray uid(Level level) const;
+
     /// The first value as a number; false and 0 when there is none.
     bool findAndGetInt(const DcmTagKey& key, int& value) const;
 
@@ -159,7 +163,7 @@ public:
     // ---- the merged view in key order
 
     iterator begin() const;
-    static iterator end();
+    iterator end() const;
 
     /// The first entry whose key is not less than `key`.
     iterator lowerBound(const DcmTagKey& key) const;

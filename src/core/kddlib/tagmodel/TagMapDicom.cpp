@@ -158,7 +158,7 @@ void TagMap::addElement(DcmElement& element, unsigned int maxLength)
 
 TagElement* TagMap::setElement(DcmElement* element)
 {
-    TagElement* copy = plainElement(element->getTag());
+    TagElement* copy = plainElement(DcmTagKey(element->getGTag(), element->getETag()));
     copyValue(*element, *copy);
     return copy;
 }

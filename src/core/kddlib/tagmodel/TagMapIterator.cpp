@@ -68,7 +68,8 @@ TagMap::iterator TagMap::begin() const
     return it;
 }
 
-TagMap::iterator TagMap::end()
+// NOLINTNEXTLINE(readability-convert-member-functions-to-static): the pair of begin()
+TagMap::iterator TagMap::end() const
 {
     return {};
 }

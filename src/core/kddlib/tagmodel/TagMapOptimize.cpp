@@ -230,7 +230,8 @@ void TagMap::storeOptionA(const DcmTagKey& key)
         deleteElement(key);
         return;
     }
-    if (TagElement* own = ownElement(key))
+    TagElement* own = ownElement(key);
+    if (own != nullptr && !own->isSequence())
         own->setVr(VrCode::Missing);
     else
         markAsMissing(key);

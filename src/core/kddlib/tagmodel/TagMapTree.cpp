@@ -126,6 +126,18 @@ void TagMap::insertUID(Level level, TagElement* uid)
         putElement(key, uid);
 }
 
+QByteArray TagMap::uid(Level level) const
+{
+    DcmTagKey key;
+    const TagElement* element = uidKey(level, key) ? findElement(key) : nullptr;
+    if (element == nullptr)
+        return {};
+    QByteArray text = element->value();
+    while (text.endsWith('\0') || text.endsWith(' '))
+        text.chop(1);
+    return text;
+}
+
 void TagMap::addChildMap(TagMap* child, Level level)
 {
     TagElement* uid = child->removeUID(level);

@@ -68,11 +68,7 @@ bool TagSequence::compare(const TagElement& other, bool checkVR, std::string* di
 
 DcmElement* TagSequence::createDcmElement(const DcmTagKey& key) const
 {
-    DcmTag tag(key);
-    // A private sequence that the dictionary does not know would otherwise be written as UN.
-    if (tag.getEVR() == EVR_UNKNOWN)
-        tag.setVR(DcmVR(EVR_SQ));
-    auto sequence = std::make_unique<DcmSequenceOfItems>(tag);
+    auto sequence = std::make_unique<DcmSequenceOfItems>(tagFor(key));
     for (const TagMap* map : mItems) {
         auto item = std::make_unique<DcmItem>();
         map->insertInto(*item);
