@@ -51,7 +51,8 @@ bool TagFile::openForMerge(QFile& file, const QString& path)
     LockedOpenResult opened =
         openLockedFile(file, path, FileLock::Exclusive, IfAbsent::Create, kMergePolling);
     const QString folder = QFileInfo(path).path();
-    if (!opened && !QDir(folder).exists()) {
+    // Another process may make the folder between the two questions, so what was not found is tried again anyhow.
+    if (opened.failure == OpenFailure::NotFound || (!opened && !QDir(folder).exists())) {
         if (!QDir().mkpath(folder))
             return failMerge(QString::asprintf("Could not create meta folder %s", qUtf8Printable(folder)));
         opened = openLockedFile(file, path, FileLock::Exclusive, IfAbsent::Create, kMergePolling);

@@ -1,0 +1,174 @@
+#include "kddlib/items/DicomJson.h"
+
+#include "kddlib/Limits.h"
+#include "kddlib/net/DicomFileReader.h"
+#include "kddlib/tagmodel/TagElement.h"
+#include "kddlib/tagmodel/TagMap.h"
+#include "support/DatasetBuilder.h"
+#include "support/RealFiles.h"
+
+#include <QJsonDocument>
+
+#include <dcmtk/dcmdata/dcjson.h>
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <memory>
+#include <random>
+#include <sstream>
+
+using namespace Kdd;
+
+namespace
+{
+
+std::string jsonOf(const TagMap& map)
+{
+    std::ostringstream out;
+    writeDicomJson(out, map, "root");
+    return out.str();
+}
+
+std::string jsonOf(const DatasetBuilder& dataset)
+{
+    return jsonOf(*std::unique_ptr<TagMap>(dataset.map()));
+}
+
+/// What DCMTK writes of a dataset in UTF-8; empty when it cannot convert it.
+std::string jsonByDcmtk(DcmDataset& dataset)
+{
+    DcmJsonFormatCompact format(OFFalse);
+    std::ostringstream out;
+    if (dataset.convertToUTF8().bad())
+        return {};
+    dataset.writeJson(out, format);
+    return '{' + out.str() + '}';
+}
+
+auto holds(const std::string& key, const std::string& value)
+{
+    return testing::HasSubstr('"' + key + "\":{\"vr\":\"LO\",\"Value\":[\"" + value + "\"]}");
+}
+
+TEST(DicomJson, EqualsThatOfADatasetInUtf8)
+{
+    const DatasetBuilder nested = anItem().with(DCM_CodeMeaning, "\xc4\xd6").with(DCM_FrameTime, "1e-3");
+    DatasetBuilder item = anItem();
+    DatasetBuilder image = anImage().with(DCM_SpecificCharacterSet, "ISO_IR 100");
+    image.with(DCM_PatientName, "M\xfcller^J\xf6rg=I=P\\Doe").with(DCM_PatientComments, "a\"b\\c\nd\x01");
+    image.with(DCM_ImageType, "A\\\\B").with(DCM_PixelSpacing, "0.50\\00.5").with(DCM_StudyDescription, "");
+    image.with(DCM_FrameIncrementPointer, "(0018,1063)").with(DCM_Rows, "512");
+    image.withItem(DCM_ReferencedImageSequence, item.withItem(DCM_PurposeOfReferenceCodeSequence, nested));
+    image.withItem(DCM_ReferencedImageSequence, anItem());
+    image.with(new DcmSequenceOfItems(DCM_RequestAttributesSequence));
+    image.with(TagElement(VrCode::OB, "bytes!").newDcmElement(DcmTag(0x0009, 0x1001, EVR_OB)).release());
+    image.with(TagElement(VrCode::UN, "8 bytes.").newDcmElement(DCM_DoubleFloatPixelData).release());
+    image.with(TagElement(VrCode::UT, "http://a").newDcmElement(DCM_RetrieveURL).release());
+    const std::unique_ptr<TagMap> map(image.map());
+    map->putAndInsertString(DcmTagKey(0x0006, 0x7100), "/never/shown");
+    EXPECT_EQ(jsonOf(*map), jsonByDcmtk(image.dataset()));
+}
+
+struct Encoded
+{
+    const char* characterSet;
+    const char* name;
+    const char* shown;  // in UTF-8
+};
+
+const Encoded kEncoded[] = {
+    {"ISO_IR 100", "M\xfcller", "Müller"},
+    {"ISO_IR 144", "\xbb\xee\xda\x63\x65\xdc\xd1\xe3\xe0", "Люкceмбур"},
+    {"ISO_IR 192", "M\xc3\xbcller", "Müller"},
+    {"GB18030", "\xcd\xf5^\xd0\xa1\xb6\xab", "王^小东"},
+    {"\\ISO 2022 IR 87", "Yamada^Tarou=\x1b$B;3ED\x1b(B^\x1b$BB@O:\x1b(B", "Yamada^Tarou=山田^太郎"},
+    {"ISO 2022 IR 13\\ISO 2022 IR 87", "\xd4\xcf\xc0\xde^\xc0\xdb\xb3", "ﾔﾏﾀﾞ^ﾀﾛｳ"},
+    {"\\ISO 2022 IR 149", "Hong^Gildong=\x1b$)C\xfb\xf3^\x1b$)C\xd1\xce\xd4\xd7", "Hong^Gildong=洪^吉洞"},
+    {"ISO_IR 192", "M\xfcller", "Müller"},  // not what it declares
+    {nullptr, "M\xfcller", "Müller"},
+    {nullptr, "M\xc3\xbcller", "Müller"},
+    {"no such set", "M\xfcller", "Müller"},
+    {"ISO_IR 100", "A\\M\xfc", "A\",\"Mü"},
+};
+
+TEST(DicomJson, DecodesTextsByTheirCharacterSet)
+{
+    for (const Encoded& row : kEncoded) {
+        DatasetBuilder image = anImage().with(DCM_StudyDescription, row.name);
+        if (row.characterSet != nullptr)
+            image.with(DCM_SpecificCharacterSet, row.characterSet);
+        EXPECT_THAT(jsonOf(image), holds("00081030", row.shown));
+    }
+}
+
+TEST(DicomJson, DecodesItemsByTheirOwnCharacterSet)
+{
+    DatasetBuilder image = anImage().with(DCM_SpecificCharacterSet, "ISO_IR 100").with(DCM_PatientID, "\xfc");
+    DatasetBuilder cyrillic = anItem().with(DCM_SpecificCharacterSet, "ISO_IR 144");
+    image.withItem(DCM_ReferencedImageSequence, anItem().with(DCM_SeriesDescription, "\xfc"));
+    image.withItem(DCM_ReferencedImageSequence, cyrillic.with(DCM_StudyDescription, "\xfc"));
+    EXPECT_THAT(jsonOf(image),
+                testing::AllOf(holds("00100020", "ü"), holds("0008103E", "ü"), holds("00081030", "ќ")));
+    DatasetBuilder ascii = anImage();
+    ascii.withItem(DCM_ReferencedImageSequence, anItem().with(DCM_SpecificCharacterSet, "ISO_IR 100"));
+    EXPECT_THAT(jsonOf(ascii), testing::Not(testing::HasSubstr("ISO_IR 100")));
+}
+
+TEST(DicomJson, TellsWhereOmittedValuesAre)
+{
+    const DatasetBuilder item = anItem().withLong(DCM_PatientComments, 2000).with(DCM_PatientID, "7");
+    DatasetBuilder image = anItem().with(DCM_PatientID, "7").withLong(DCM_PatientComments, 2000);
+    image.withItem(DCM_ReferencedImageSequence, anItem()).withItem(DCM_ReferencedImageSequence, item);
+    image.withItem(DcmTag(0x0009, 0x1002, EVR_SQ), item);
+    const std::unique_ptr<TagMap> map(image.map());
+    map->markAsOmitted(DCM_PixelData);
+    EXPECT_EQ(jsonOf(*map),
+              R"({"00080005":{"vr":"CS","Value":["ISO_IR 192"]},)"
+              R"("00081140":{"vr":"SQ","Value":[{},{"00100020":{"vr":"LO","Value":["7"]},)"
+              R"("00104000":{"vr":"LT","BulkDataURI":"root/00081140/1/00104000"}}]},)"
+              R"("00091002":{"vr":"UN","BulkDataURI":"root/00091002"},"00100020":{"vr":"LO","Value":["7"]},)"
+              R"("00104000":{"vr":"LT","BulkDataURI":"root/00104000"},)"
+              R"("7FE00010":{"vr":"OB","BulkDataURI":"root/7FE00010"}})");
+}
+
+TEST(DicomJson, IsValidWhateverBytesTextsHold)
+{
+    std::mt19937 random(1);
+    const char* const characterSets[] = {"",        "ISO_IR 192",       "ISO_IR 100",
+                                         "GB18030", "\\ISO 2022 IR 87", "ISO 2022 IR 13\\ISO 2022 IR 149"};
+    const char pieces[] = "a^=\\\"\n\x1b$B(J)CE\x80\xc3\xbc\xe3\xff\xfe\xed\xa0\x7f\x01";
+    for (int i = 0; i < 2000; ++i) {
+        QByteArray text;
+        for (auto left = random() % 12; left > 0; --left)
+            text.append(pieces[random() % (sizeof pieces - 1)]);
+        DatasetBuilder image = anItem().with(DCM_SpecificCharacterSet, characterSets[random() % 6]);
+        image.with(DCM_PatientName, text.constData()).with(DCM_PatientComments, text.constData());
+        const QByteArray json = QByteArray::fromStdString(jsonOf(image));
+        ASSERT_EQ(QString::fromUtf8(json).toUtf8(), json) << text.toHex().constData();
+        ASSERT_TRUE(QJsonDocument::fromJson(json).isObject()) << text.toHex().constData();
+    }
+}
+
+TEST(DicomJson, EqualsThatOfRealFiles)
+{
+    if (realFilesFolder().isEmpty())
+        GTEST_SKIP() << "KDD_TEST_DATA names no folder of real files";
+    int compared = 0;
+    int notConverted = 0;
+    for (const char* folder : {"series", "multiframe", "modalities", "charsets"}) {
+        for (const QString& name : realFiles(folder)) {
+            DcmFileFormat file;
+            if (readDicomFile(name.toLocal8Bit().constData(), file).bad())
+                continue;
+            file.getDataset()->findAndDeleteElement(DCM_PixelData, OFTrue, OFTrue);
+            const std::unique_ptr<TagMap> map(TagMap::createTagMap(file.getDataset(), kLargeValueBound));
+            const std::string ours = jsonOf(*map);
+            const std::string theirs = jsonByDcmtk(*file.getDataset());
+            ++(theirs.empty() ? notConverted : compared);
+            EXPECT_EQ(ours, theirs.empty() ? ours : theirs) << qPrintable(name);
+        }
+    }
+    EXPECT_GT(compared, 20 * notConverted);
+}
+
+}  // namespace

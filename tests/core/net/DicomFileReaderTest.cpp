@@ -1,0 +1,174 @@
+#include "kddlib/net/DicomFileReader.h"
+
+#include "kddlib/Limits.h"
+#include "kddlib/tagmodel/TagMap.h"
+#include "kddlib/tagmodel/TagSequence.h"
+#include "support/LogCapture.h"
+
+#include <QFile>
+#include <QTemporaryDir>
+#include <QtEndian>
+
+#include <dcmtk/config/osconfig.h>
+
+#include <dcmtk/dcmdata/dctk.h>
+#include <gtest/gtest.h>
+
+#include <memory>
+
+using namespace Kdd;
+
+namespace
+{
+
+/// A transfer syntax, with lengths or with delimiters.
+struct Encoding
+{
+    const char* name;
+    E_TransferSyntax xfer;
+    bool hasLengths;
+};
+
+const Encoding kEncodings[] = {{"LittleEndian", EXS_LittleEndianExplicit, true},
+                               {"LittleEndianDelimited", EXS_LittleEndianExplicit, false},
+                               {"Implicit", EXS_LittleEndianImplicit, true},
+                               {"ImplicitDelimited", EXS_LittleEndianImplicit, false},
+                               {"BigEndian", EXS_BigEndianExplicit, true},
+                               {"BigEndianDelimited", EXS_BigEndianExplicit, false},
+                               {"Deflated", EXS_DeflatedLittleEndianExplicit, true},
+                               {"DeflatedDelimited", EXS_DeflatedLittleEndianExplicit, false}};
+
+/// Writes a dataset byte by byte: what nests so deep no library would write.
+class DatasetBytes
+{
+public:
+    explicit DatasetBytes(const Encoding& encoding)
+        : mXfer(encoding.xfer)
+        , mHasLengths(encoding.hasLengths)
+    {
+    }
+
+    /// A sequence with an item that holds such a sequence, and so on, `depth` items in all.
+    DatasetBytes& nest(quint16 group, quint16 element, int depth)
+    {
+        for (int left = depth; left > 0; --left) {
+            number(group).number(element);
+            if (mXfer.isExplicitVR())
+                mBytes.append("SQ", 2).append(2, 0);
+            const int header = mXfer.isExplicitVR() ? 12 : 8;
+            length(left * 8 + (left - 1) * header);
+            tag(0xe000);
+            length((left - 1) * (8 + header));
+        }
+        for (int i = 0; i < depth && !mHasLengths; ++i)
+            tag(0xe00d).number<quint32>(0).tag(0xe0dd).number<quint32>(0);
+        return *this;
+    }
+
+    /// A file of the dataset.
+    QByteArray file() const
+    {
+        QByteArray uid(mXfer.getXferID());
+        uid.append(uid.size() % 2, 0);
+        const QByteArray syntax = QByteArray("\2\0\20\0UI", 6) + char(uid.size()) + '\0' + uid;
+        const QByteArray length = QByteArray("\2\0\0\0UL\4\0", 8) + char(syntax.size()) + QByteArray(3, 0);
+        // A raw stream, without the frame of Qt's and of zlib's.
+        const QByteArray deflated = qCompress(mBytes).mid(6).chopped(4);
+        const bool isDeflated = mXfer.getStreamCompression() != ESC_none;
+        return QByteArray(128, 0) + "DICM" + length + syntax + (isDeflated ? deflated : mBytes);
+    }
+
+private:
+    template <typename T>
+    DatasetBytes& number(T value)
+    {
+        const T ordered = mXfer.isBigEndian() ? qToBigEndian(value) : qToLittleEndian(value);
+        mBytes.append(reinterpret_cast<const char*>(&ordered), sizeof ordered);
+        return *this;
+    }
+
+    DatasetBytes& tag(quint16 element) { return number<quint16>(0xfffe).number(element); }
+
+    void length(int bytes) { number(mHasLengths ? static_cast<quint32>(bytes) : 0xffffffffU); }
+
+    DcmXfer mXfer;
+    bool mHasLengths;
+    QByteArray mBytes;
+};
+
+/// How many items the cache keeps inside each other.
+int depthOf(DcmDataset& dataset, const DcmTagKey& key)
+{
+    const std::unique_ptr<TagMap> map(TagMap::createTagMap(&dataset, kDefaultValueBound));
+    int depth = 0;
+    const TagElement* element = map->findElement(key);
+    for (; element != nullptr && element->isSequence(); ++depth)
+        element = static_cast<const TagSequence*>(element)->item(0)->findElement(key);
+    return depth;
+}
+
+class DicomFileReader : public testing::Test
+{
+protected:
+    void SetUp() override { OFLog::configure(OFLogger::OFF_LOG_LEVEL); }
+
+    OFCondition read(const QByteArray& bytes)
+    {
+        QFile written(mFolder.filePath(QStringLiteral("file")));
+        EXPECT_TRUE(written.open(QIODevice::WriteOnly) && written.write(bytes) == bytes.size());
+        written.close();
+        return readDicomFile(written.fileName().toLocal8Bit().constData(), file);
+    }
+
+    DcmFileFormat file;
+
+private:
+    QTemporaryDir mFolder;
+};
+
+class DeepFile : public DicomFileReader, public testing::WithParamInterface<Encoding>
+{
+};
+
+TEST_P(DeepFile, IsReadWithAsManyNestedItemsAsAreAllowed)
+{
+    DatasetBytes bytes(GetParam());
+    bytes.nest(0x0008, 0x1140, kMaxItemDepth).nest(0x0040, 0x0275, kMaxItemDepth);
+    EXPECT_STREQ(read(bytes.file()).text(), "Normal");
+    EXPECT_EQ(depthOf(*file.getDataset(), DCM_ReferencedImageSequence), kMaxItemDepth);
+    EXPECT_EQ(depthOf(*file.getDataset(), DCM_RequestAttributesSequence), kMaxItemDepth);
+}
+
+TEST_P(DeepFile, IsRefusedWhenItNestsDeeper)
+{
+    for (const int depth : {kMaxItemDepth + 1, 100000}) {
+        const QByteArray bytes = DatasetBytes(GetParam()).nest(0x0008, 0x1140, depth).file();
+        EXPECT_STREQ(read(bytes).text(), "Sequence items are nested too deep");
+    }
+}
+
+INSTANTIATE_TEST_SUITE_P(Encodings, DeepFile, testing::ValuesIn(kEncodings),
+                         [](const auto& encoding) { return encoding.param.name; });
+
+TEST_F(DicomFileReader, DoesNotCountItemsBesideEachOther)
+{
+    DatasetBytes bytes(kEncodings[1]);
+    for (int i = 0; i < 600; ++i)
+        bytes.nest(0x0009, static_cast<quint16>(0x1000 + i), 1 + i % 7);
+    EXPECT_TRUE(read(bytes.file()).good());
+    EXPECT_EQ(file.getDataset()->card(), 600U);
+    EXPECT_TRUE(read(bytes.file().chopped(1)).bad());
+    EXPECT_TRUE(readDicomFile("/proc/no/such/file", file).bad());
+}
+
+TEST_F(DicomFileReader, LeavesTheSameBoundToDatasetsInMemory)
+{
+    DcmItem* item = file.getDataset();
+    for (int i = 0; i <= kMaxItemDepth; ++i)
+        ASSERT_TRUE(item->findOrCreateSequenceItem(DCM_ReferencedImageSequence, item, -2).good());
+    const LogCapture log;
+    EXPECT_EQ(depthOf(*file.getDataset(), DCM_ReferencedImageSequence), kMaxItemDepth);
+    EXPECT_EQ(log.count("Sequence (0008,1140) lies deeper than 256 items and is left out"), 1);
+}
+
+}  // namespace

@@ -1,0 +1,107 @@
+#include "kddlib/tagmodel/TagMap.h"
+#include "kddlib/tagmodel/TagSequence.h"
+#include "support/DatasetBuilder.h"
+#include "support/TreeText.h"
+
+#include <gtest/gtest.h>
+
+using namespace Kdd;
+
+namespace
+{
+
+const DcmTagKey kSequence = DCM_RequestAttributesSequence;
+
+TagMap* item(const TagMap& node, int i)
+{
+    return static_cast<TagSequence*>(node.findElement(kSequence))->item(i);
+}
+
+/// A study and a series, to which images are attached.
+class TreeTest : public testing::Test
+{
+protected:
+    TreeTest()
+    {
+        series->putAndInsertString(DCM_SeriesInstanceUID, "1.2.3");
+        study.addChildMap(series, TagMap::SeriesLevel);
+    }
+
+    TagMap* attach(const DatasetBuilder& image)
+    {
+        TagMap* map = image.map();
+        series->addChildMap(map, TagMap::ImageLevel);
+        return map;
+    }
+
+    TagMap study;
+    TagMap* series = new TagMap;
+};
+
+TEST_F(TreeTest, TheFirstImageGivesAllButItsUIDToItsSeries)
+{
+    const TagMap* image = attach(anImage("1.2.3.1").with(DCM_InstanceNumber, "1"));
+    EXPECT_EQ(ownText(*image), "0008,0018 22 1.2.3.1\n");
+    EXPECT_EQ(ownText(*series), "0008,0016 22 1.2.840.10008.5.1.4.1.1.7\n0020,000d 22 1.2\n"
+                                "0020,000e 22 1.2.3\n0020,0013 9 1\n");
+}
+
+TEST_F(TreeTest, ALaterImageHoldsWhatDiffersAndHidesWhatItLacks)
+{
+    const TagMap* first = attach(anImage("1.2.3.1").with(DCM_InstanceNumber, "1").with(DCM_PatientID, "7"));
+    const TagMap* second = attach(anImage("1.2.3.2").with(DCM_InstanceNumber, "2"));
+    EXPECT_EQ(ownText(*second), "0008,0018 22 1.2.3.2\n0010,0020 29 \n0020,0013 9 2\n");
+    EXPECT_EQ(first->findElement(DCM_InstanceNumber)->value(), "1");
+    EXPECT_EQ(second->findElement(DCM_PatientID), nullptr);
+    EXPECT_EQ(second->lowerBound(DCM_PatientID).key(), DCM_StudyInstanceUID);
+    int number = 5;
+    EXPECT_FALSE(second->findAndGetInt(DCM_PatientID, number));
+    EXPECT_EQ(number, 0);
+    EXPECT_EQ(series->findElement(DCM_InstanceNumber)->numDiffering(), 1U);
+    EXPECT_EQ(series->findElement(DCM_InstanceNumber)->numMissing(), 0U);
+    EXPECT_EQ(series->findElement(DCM_PatientID)->numMissing(), 1U);
+    EXPECT_EQ(series->findElement(DCM_SOPClassUID)->numDiffering(), 0U);
+}
+
+DatasetBuilder anImageWithItems(const char* sopUID, const char* description)
+{
+    const DatasetBuilder nested = anItem().with(DCM_CodeValue, "C").with(DCM_CodeMeaning, description);
+    DatasetBuilder first = anItem().with(DCM_RequestedProcedureID, "P");
+    return anImage(sopUID)
+        .withItem(kSequence, first.withItem(DCM_ScheduledProtocolCodeSequence, nested))
+        .withItem(kSequence, anItem().with(DCM_RequestedProcedureID, description));
+}
+
+/// Ways in which the item above, from which an item inherits, can go.
+using Removal = void (*)(TagMap& series, TagMap& image);
+
+const Removal kRemovals[] = {
+    [](TagMap& series, TagMap&) { series.deleteElement(kSequence); },
+    [](TagMap& series, TagMap&) { series.markAsMissing(kSequence); },
+    [](TagMap& series, TagMap&) { series.putAndInsertValue(kSequence, VrCode::UN, "x"); },
+    [](TagMap& series, TagMap&) { static_cast<TagSequence*>(series.findElement(kSequence))->truncate(0); },
+    [](TagMap& series, TagMap&) { series.putElement(kSequence, series.findElement(kSequence)->clone()); },
+    [](TagMap&, TagMap& image) { image.detachItems(); },
+};
+
+TEST_F(TreeTest, AnItemTakesOverWhatItInheritsWhenTheOneAboveGoes)
+{
+    const DatasetBuilder built = anImageWithItems("1.2.3.2", "B");
+    const std::string alone = shownText(*std::unique_ptr<TagMap>(built.map()));
+    attach(anImageWithItems("1.2.3.1", "A"));
+    for (const Removal remove : kRemovals) {
+        TagMap* image = attach(built);
+        EXPECT_EQ(item(*image, 0)->parent(), item(*series, 0));
+        EXPECT_EQ(ownText(*item(*image, 0)), "0040,0008 18 \n item\n  0008,0104 10 B\n");
+        const std::unique_ptr<TagElement> before(series->findElement(kSequence)->clone());
+        remove(*series, *image);
+        EXPECT_EQ(item(*image, 0)->parent(), nullptr);
+        EXPECT_EQ(shownText(*image), alone);
+        series->putElement(kSequence, before->clone());
+        study.relinkItems();
+        EXPECT_EQ(item(*image, 0)->parent(), item(*series, 0));
+        EXPECT_EQ(shownText(*image), alone);
+    }
+}
+
+}  // namespace
