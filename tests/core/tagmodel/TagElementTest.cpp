@@ -99,15 +99,14 @@ TEST(TagElement, TakesATextInItsOwnEncoding)
 
 TEST(TagElement, ANumberChoosesItsRepresentation)
 {
-    const Text rows[] = {{VrCode::OB, hex("ff"), "255"},
-                         {VrCode::US, hex("0001"), "256"},
-                         {VrCode::SL, hex("00000100"), "65536"},
-                         {VrCode::SL, hex("ffffffff"), "-1"}};
-    for (const Text& row : rows) {
+    const std::pair<int, VrCode> rows[] = {{0, VrCode::OB},     {255, VrCode::OB},   {256, VrCode::US},
+                                           {65535, VrCode::US}, {65536, VrCode::SL}, {-1, VrCode::SL}};
+    for (const auto& [number, vr] : rows) {
         TagElement element(VrCode::PN, "Doe");
-        element.putValue(std::stoi(row.text));
-        EXPECT_EQ(element.vr(), row.vr);
-        EXPECT_EQ(element.value(), row.value);
+        element.putValue(number);
+        EXPECT_EQ(element.vr(), vr);
+        EXPECT_EQ(element.valueAsInt(nullptr, 0), number);
+        EXPECT_EQ(element.numFields(), 1);
     }
 }
 
