@@ -328,7 +328,7 @@ DatasetBuilder partOf(int process, int image)
     return random.image(QByteArray::fromStdString(uidOf(process, image)));
 }
 
-/// One process' part of the study, merged in two goes as long as the others hold the file.
+/// One process' part of the study, merged in two goes, each again while the others hold the file.
 bool mergePart(int process)
 {
     for (int first = 0; first < kImagesEach; first += kImagesEach / 2) {
@@ -367,7 +367,7 @@ protected:
     }
 
     /// Lets all processes merge their parts at once into a store that is still empty, and reads all the while.
-    void mergeAll(int victim, long lifetime)
+    void mergeAll(int victim = -1, long lifetime = -1)
     {
         QDir(QString::fromLocal8Bit(TagFile::metaFolder())).removeRecursively();
         std::vector<pid_t> pids;
@@ -431,7 +431,7 @@ private:
 TEST_F(ConcurrentMerges, LoseNothing)
 {
     for (int round = 0; round < 3; ++round) {
-        mergeAll(-1, 0);
+        mergeAll();
         ASSERT_EQ(shownByFile(), mExpected);
     }
 }
