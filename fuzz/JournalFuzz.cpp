@@ -1,5 +1,5 @@
-// Whatever lies in a file's journal, recovery leaves no journal, and the file as it was; or, when the journal is complete,
-// the file with exactly its content.
+// Whatever lies in a file's journal, recovery leaves no journal, and the file as it was; or, when the journal is
+// complete, the file with exactly its content.
 
 #include "fuzz/Property.h"
 #include "platform/os/ExclusiveFile.h"

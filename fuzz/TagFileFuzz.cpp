@@ -41,8 +41,8 @@ bool isSmall(const TagFile& file)
     return size <= kMaxSize;
 }
 
-/// Writers keep previews beside the records and readers make them OB. One of another VR stands in a record itself, where
-/// no writer puts it, and becomes OB.
+/// Writers keep previews beside the records and readers make them OB. One of another VR stands in a record itself,
+/// where no writer puts it, and becomes OB.
 bool hasForeignPreview(const std::string& shown)
 {
     static const std::string kKey = "0006,7105 ";

@@ -93,7 +93,8 @@ public:
 
     // ---- from and to DICOM
 
-    /// A new map without parent of every attribute of the item; the caller owns it. Group lengths are left out. A
+    /// A new map without parent of every attribute of the item; the caller owns it. Group lengths and what stands
+    /// under our own keys (0006,71xx) are left out. A
     /// value longer than `maxLength` [bytes] is marked as omitted, with a larger bound for overlays, curves, look-up
     /// tables and graphics; so are encapsulated pixel data and sequences nested deeper than `kMaxItemDepth`. A data
     /// set's original transfer syntax, if it has one, becomes the one byte of (0006,7102).

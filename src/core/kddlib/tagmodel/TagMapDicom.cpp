@@ -25,6 +25,12 @@ bool isRepeatingGroup(const DcmTagKey& key, Uint16 first)
     return key.getGroup() >= first && key.getGroup() <= first + 0x1e && key.getElement() == 0x3000;
 }
 
+/// What a file brings under our own keys is not ours: it would pass for the image's path, volume or preview.
+bool isOwnAttribute(const DcmTagKey& key)
+{
+    return key.getGroup() == 0x0006 && (key.getElement() & 0xff00) == 0x7100;
+}
+
 /// Attributes that viewers need whole whatever their length.
 bool hasLargeBound(const DcmTagKey& key)
 {
@@ -117,7 +123,7 @@ TagMap* TagMap::createTagMap(DcmItem* item, unsigned int maxLength, int depth)
 void TagMap::addObject(DcmObject& object, unsigned int maxLength, int depth)
 {
     const DcmTagKey key(object.getGTag(), object.getETag());
-    if (key.getGroup() == 0 || key.getElement() == 0)
+    if (key.getGroup() == 0 || key.getElement() == 0 || isOwnAttribute(key))
         return;
     if (object.ident() == EVR_SQ)
         addSequence(static_cast<DcmSequenceOfItems&>(object), maxLength, depth);

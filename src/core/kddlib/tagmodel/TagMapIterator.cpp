@@ -4,27 +4,16 @@
 namespace Kdd
 {
 
-namespace
-{
-
-const DcmTagKey kBeyondEveryKey(0xffff, 0xffff);
-
-}  // namespace
-
+/// Makes the level with the smallest key the current one; of equal keys the nearer node's is taken.
 void TagMap::iterator::choose()
 {
-    const DcmTagKey* smallest = &kBeyondEveryKey;
+    const DcmTagKey* smallest = nullptr;
     mCurrent = 0;
     for (int i = 0; i < mCount; ++i) {
-        // Strictly smaller, so that of equal keys the nearer node's element is taken.
-        if (!mLevels[i].atEnd() && mLevels[i].at.key() < *smallest) {
+        if (!mLevels[i].atEnd() && (smallest == nullptr || mLevels[i].at.key() < *smallest)) {
             smallest = &mLevels[i].at.key();
             mCurrent = i;
         }
-    }
-    if (smallest == &kBeyondEveryKey) {
-        for (int i = 0; i < mCount; ++i)
-            mLevels[i].at = mLevels[i].end;
     }
 }
 
