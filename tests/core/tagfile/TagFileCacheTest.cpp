@@ -1,17 +1,8 @@
-#include "kddlib/tagfile/TagFile.h"
-#include "kddlib/tagmodel/TagMap.h"
+#include "TagFileFixture.h"
 #include "platform/base/LogFile.h"
-#include "support/DatasetBuilder.h"
-#include "support/LogCapture.h"
-#include "support/TemporaryStore.h"
-#include "support/TreeText.h"
 
-#include <QDir>
-#include <QFile>
-#include <QFileInfo>
 #include <QtEndian>
 
-#include <gtest/gtest.h>
 #include <libdeflate.h>
 #include <sys/resource.h>
 #include <sys/wait.h>
@@ -27,7 +18,7 @@ namespace
 
 const char* const kStudy = "1.2";
 
-/// What `life` answers in a process of its own: 1 for true, 0 for false; the signal, negative, when that ended it.
+/// Whether `life` is true in a process of its own; the signal, negative, when that ended it.
 int inChild(const std::function<bool()>& life)
 {
     int status = 0;
@@ -38,28 +29,12 @@ int inChild(const std::function<bool()>& life)
     return WIFEXITED(status) ? WEXITSTATUS(status) : -WTERMSIG(status);
 }
 
-enum class WhenFull { Fail, Die };
-
-/// From now on no file of this process can grow beyond `size`.
-void fillDisk(qint64 size, WhenFull then)
+/// From now on no file of this process can grow beyond `size`: a write fails, or by the default action ends it.
+void fillDisk(qint64 size, sighandler_t action)
 {
-    ::signal(SIGXFSZ, then == WhenFull::Fail ? SIG_IGN : SIG_DFL);
+    ::signal(SIGXFSZ, action);
     const rlimit limit = {static_cast<rlim_t>(size), static_cast<rlim_t>(size)};
     ::setrlimit(RLIMIT_FSIZE, &limit);
-}
-
-void put(const QString& path, const QByteArray& content)
-{
-    QDir().mkpath(QFileInfo(path).path());
-    QFile file(path);
-    ASSERT_TRUE(file.open(QIODevice::WriteOnly));
-    ASSERT_EQ(file.write(content), content.size());
-}
-
-QByteArray contentOf(const QString& path)
-{
-    QFile file(path);
-    return file.open(QIODevice::ReadOnly) ? file.readAll() : QByteArray("(no file)");
 }
 
 /// The journal of a writer that was about to write the content.
@@ -72,35 +47,41 @@ QByteArray journalOf(const QByteArray& content)
     return bytes + content;
 }
 
-class TagFileCache : public testing::Test
+bool write(TagFile& file)
+{
+    return file.writeCacheFile();
+}
+
+bool merge(TagFile& file)
+{
+    return file.mergeIntoCacheFile();
+}
+
+class TagFileCache : public TagFileTest
 {
 protected:
     void TearDown() override { LogFile::setLevel(LogFile::Level::Information); }
 
-    static QString path() { return TagFile::cacheFilePathForStudy(kStudy); }
-    static QString journal() { return path() + QStringLiteral(".journal"); }
-    static std::string named(const char* message) { return message + path().toStdString(); }
-
+    /// Adds images whose values cannot be compressed much, so that more images always take more room.
     static void fill(TagFile& file, int from, int to)
     {
-        // Values that cannot be compressed much, so that more images always take more room.
         for (int i = from; i <= to; ++i) {
             DatasetBuilder image = anImage(QByteArray::number(i).constData());
             for (int word = 1; word < 20; ++word)
                 image.withItem(
                     DCM_RequestAttributesSequence,
                     anItem().with(DCM_CodeValue, QByteArray::number(i * word * 1103515245LL).right(12)));
-            file.addTagMap(image.map(), nullptr, true);
+            add(file, image);
         }
     }
 
-    /// Writes a file of images 1 to `count`.
-    static void build(int count)
+    static bool put(int from, int to, bool (*how)(TagFile&))
     {
         TagFile file;
-        fill(file, 1, count);
-        ASSERT_TRUE(file.writeCacheFile());
+        fill(file, from, to);
+        return how(file);
     }
+    using TagFileTest::put;
 
     /// How many images a reader finds; -1 when it finds no study.
     static int imagesFound()
@@ -108,28 +89,9 @@ protected:
         TagFile file;
         return file.readCacheFileForStudy(kStudy, false) ? file.imagesByUID().size() : -1;
     }
-
-    static bool merge(int from, int to)
-    {
-        TagFile file;
-        fill(file, from, to);
-        return file.mergeIntoCacheFile();
-    }
-
-    TemporaryStore mStore;
 };
 
-TEST_F(TagFileCache, ThePathIsTheDigestOfTheUidAndALineFeed)
-{
-    TagFile::setMetaFolder("/meta");
-    EXPECT_EQ(TagFile::cacheFilePathForStudy("1.2.3"),
-              QStringLiteral("/meta/e3/16/640a77b2a412ac0fe91cb85078c4.tc"));
-    TagFile file;
-    fill(file, 1, 1);
-    EXPECT_EQ(file.cacheFilePath(), path());
-}
-
-TEST_F(TagFileCache, WhatIsWrittenIsFoundByItsStudy)
+TEST_F(TagFileCache, WhatIsWrittenIsFoundByTheDigestOfItsUid)
 {
     TagFile file;
     fill(file, 1, 3);
@@ -138,27 +100,30 @@ TEST_F(TagFileCache, WhatIsWrittenIsFoundByItsStudy)
     ASSERT_TRUE(again.readCacheFileForStudy(kStudy, false));
     EXPECT_EQ(treeText(again), treeText(file));
     EXPECT_FALSE(again.close()) << "not kept open";
-    const QByteArray elsewhere = mStore.filePath("some/where/else.tc").toLocal8Bit();
-    ASSERT_TRUE(file.writeCacheFile(elsewhere.constData()));
-    EXPECT_EQ(contentOf(QString::fromLocal8Bit(elsewhere)), contentOf(path()));
-    EXPECT_FALSE(again.readCacheFile(path(), "1.2.0", false)) << "another study";
+    const QString elsewhere = mStore.filePath("some/where/else.tc");
+    ASSERT_TRUE(file.writeCacheFile(elsewhere.toLocal8Bit().constData()));
+    EXPECT_EQ(content(elsewhere), content());
+    EXPECT_FALSE(again.readCacheFile(elsewhere, "1.2.0", false)) << "another study";
+    // Of the UID and a line feed.
+    TagFile::setMetaFolder("/meta");
+    EXPECT_EQ(TagFile::cacheFilePathForStudy("1.2.3"),
+              QStringLiteral("/meta/e3/16/640a77b2a412ac0fe91cb85078c4.tc"));
+    EXPECT_EQ(file.cacheFilePath(), path());
 }
 
 TEST_F(TagFileCache, AnAbsentFileIsWorthALineOnlyToWhoeverDebugs)
 {
     const LogCapture log;
     TagFile file;
-    EXPECT_FALSE(file.readCacheFileForStudy(kStudy, false));
-    EXPECT_FALSE(file.readCacheFileForStudy(kStudy, true));
+    EXPECT_FALSE(file.readCacheFileForStudy(kStudy, false) || file.readCacheFileForStudy(kStudy, true));
     EXPECT_TRUE(log.lines().empty());
-    EXPECT_FALSE(file.failure().isEmpty());
-    EXPECT_FALSE(file.wasLockedOut());
+    EXPECT_FALSE(file.failure().isEmpty() || file.wasLockedOut());
     LogFile::setLevel(LogFile::Level::Timing);
     EXPECT_FALSE(file.readCacheFileForStudy(kStudy, false));
     EXPECT_EQ(log.count(named("Could not open ")), 1);
 }
 
-TEST_F(TagFileCache, SaysWhatCannotBeRead)
+TEST_F(TagFileCache, SaysWhatCannotBeReadOrWritten)
 {
     const LogCapture log;
     put(path(), "no tag file");
@@ -171,14 +136,7 @@ TEST_F(TagFileCache, SaysWhatCannotBeRead)
     QDir().mkpath(path());
     EXPECT_FALSE(file.readCacheFileForStudy(kStudy, false));
     EXPECT_EQ(log.count(named("Could not open ") + ": "), 1);
-}
-
-TEST_F(TagFileCache, SaysWhatCannotBeWritten)
-{
-    const LogCapture log;
-    TagFile file;
     fill(file, 1, 1);
-    QDir().mkpath(path());
     EXPECT_FALSE(file.writeCacheFile());
     EXPECT_EQ(log.count(named("Could not open ") + " for writing"), 1);
     EXPECT_FALSE(file.writeCacheFile("/proc/kdd/file.tc"));
@@ -187,10 +145,41 @@ TEST_F(TagFileCache, SaysWhatCannotBeWritten)
     EXPECT_EQ(file.imagesByUID().size(), 1);
 }
 
+TEST_F(TagFileCache, WhoKeepsItOpenLocksOthersOut)
+{
+    ASSERT_TRUE(put(1, 2, write));
+    TagFile file;
+    ASSERT_TRUE(file.readCacheFileForStudy(kStudy, true));
+    const auto isLockedOut = [](bool (*operation)(TagFile&), const char* ending) {
+        const LogCapture log;
+        TagFile other;
+        fill(other, 3, 3);
+        return !operation(other) && other.wasLockedOut() && !other.failure().isEmpty() &&
+               log.count(named("Could not open ") + ending) == (*ending != 0 ? 1 : 0);
+    };
+    const auto isReader = [&] {
+        return isLockedOut([](TagFile& other) { return other.readCacheFileForStudy(kStudy, false); }, ": ");
+    };
+    const auto isKeeper = [&] {
+        return isLockedOut([](TagFile& other) { return other.readCacheFileForStudy(kStudy, true); }, "");
+    };
+    const auto isMerger = [&] {
+        return isLockedOut([](TagFile& other) { return merge(other) || other.imagesByUID().size() != 1; },
+                           " for read-write: error code ");
+    };
+    EXPECT_EQ(inChild(isReader), 1);
+    EXPECT_EQ(inChild(isKeeper), 1);
+    EXPECT_EQ(inChild(isMerger), 1);
+    fill(file, 4, 4);
+    EXPECT_TRUE(file.writeCacheFile());
+    EXPECT_EQ(inChild([] { return put(5, 5, merge); }), 1);
+    EXPECT_EQ(imagesFound(), 4);
+}
+
 TEST_F(TagFileCache, IsOpenedOnlyOnce)
 {
     const LogCapture log;
-    build(2);
+    ASSERT_TRUE(put(1, 2, write));
     TagFile file;
     ASSERT_TRUE(file.readCacheFileForStudy(kStudy, true));
     EXPECT_FALSE(file.readCacheFileForStudy(kStudy, false));
@@ -201,135 +190,88 @@ TEST_F(TagFileCache, IsOpenedOnlyOnce)
     EXPECT_TRUE(file.readCacheFileForStudy(kStudy, false));
 }
 
-TEST_F(TagFileCache, WhoKeepsItOpenLocksOthersOut)
-{
-    build(2);
-    TagFile file;
-    ASSERT_TRUE(file.readCacheFileForStudy(kStudy, true));
-    const auto isLockedOut = [](const std::function<bool(TagFile&)>& operation) {
-        TagFile other;
-        fill(other, 3, 3);
-        return !operation(other) && other.wasLockedOut() && !other.failure().isEmpty();
-    };
-    EXPECT_EQ(inChild([&] {
-                  const LogCapture log;
-                  return isLockedOut(
-                             [](TagFile& other) { return other.readCacheFileForStudy(kStudy, false); }) &&
-                         log.count(named("Could not open ")) == 1;
-              }),
-              1);
-    EXPECT_EQ(inChild([&] {
-                  return isLockedOut(
-                      [](TagFile& other) { return other.readCacheFileForStudy(kStudy, true); });
-              }),
-              1);
-    EXPECT_EQ(inChild([&] {
-                  const LogCapture log;
-                  return isLockedOut([](TagFile& other) {
-                             return other.mergeIntoCacheFile() || other.imagesByUID().size() != 1;
-                         }) &&
-                         log.count(named("Could not open ") + " for read-write: error code ") == 1;
-              }),
-              1);
-    fill(file, 4, 4);
-    EXPECT_TRUE(file.writeCacheFile());
-    EXPECT_EQ(inChild([] { return merge(5, 5); }), 1);
-    EXPECT_EQ(imagesFound(), 4);
-}
-
 TEST_F(TagFileCache, AShorterStudyInAFileKeptOpenLeavesTheOldEnd)
 {
-    build(9);
-    const QByteArray before = contentOf(path());
+    ASSERT_TRUE(put(1, 9, write));
+    const QByteArray before = content();
     TagFile file;
     ASSERT_TRUE(file.readCacheFileForStudy(kStudy, true));
     for (const char* uid : {"2", "3", "4", "5", "6", "7", "8", "9"})
         file.removeImages(1, &uid);
     ASSERT_TRUE(file.writeCacheFile());
-    EXPECT_EQ(contentOf(path()).right(100), before.right(100));
-    EXPECT_EQ(contentOf(path()).size(), before.size());
+    EXPECT_EQ(content().right(100), before.right(100));
+    EXPECT_EQ(content().size(), before.size());
     EXPECT_EQ(imagesFound(), 1);
     ASSERT_TRUE(file.writeCacheFile()) << "not open any more, so made anew";
-    EXPECT_LT(contentOf(path()).size(), before.size());
+    EXPECT_LT(content().size(), before.size());
     EXPECT_EQ(imagesFound(), 1);
 }
 
 TEST_F(TagFileCache, AnEmptyOneDeletesTheFileKeptOpen)
 {
-    build(2);
+    ASSERT_TRUE(put(1, 2, write));
     TagFile file;
     EXPECT_FALSE(file.writeCacheFile()) << "nothing is open";
     ASSERT_TRUE(file.readCacheFileForStudy(kStudy, true));
     // What a write leaves that the device refused halfway would bring the study back.
-    put(journal(), journalOf(contentOf(path())));
+    put(journal(), journalOf(content()));
     file.clear();
     EXPECT_TRUE(file.writeCacheFile());
     EXPECT_FALSE(QFile::exists(path()));
-    EXPECT_FALSE(file.close());
-    EXPECT_TRUE(merge(3, 3)) << "nobody is locked out";
+    EXPECT_TRUE(put(3, 3, merge)) << "nobody is locked out";
     EXPECT_EQ(imagesFound(), 1);
-}
-
-bool writeWhole(TagFile& file)
-{
-    return file.writeCacheFile();
-}
-
-bool mergeWhole(TagFile& file)
-{
-    return file.mergeIntoCacheFile();
 }
 
 TEST_F(TagFileCache, AFullDiskLeavesTheOldFileWhole)
 {
-    build(4);
-    const QByteArray before = contentOf(path());
-    const auto fails = [&](bool keepOpen, bool (*write)(TagFile&)) {
-        const LogCapture log;
-        TagFile file;
-        if (keepOpen && !file.readCacheFileForStudy(kStudy, true))
-            return false;
-        fill(file, 1, 9);
-        fillDisk(before.size() + 50, WhenFull::Fail);
-        return !write(file) && !file.failure().isEmpty() && log.count(path().toStdString()) == 1 &&
-               file.imagesByUID().size() == 9;
-    };
-    EXPECT_EQ(inChild([&] { return fails(false, writeWhole); }), 1);
-    EXPECT_EQ(inChild([&] { return fails(true, writeWhole); }), 1);
-    EXPECT_EQ(inChild([&] { return fails(false, mergeWhole); }), 1);
-    EXPECT_EQ(contentOf(path()), before);
+    ASSERT_TRUE(put(1, 4, write));
+    const QByteArray before = content();
+    for (const auto how : {write, merge}) {
+        for (const bool keepOpen : {false, true}) {
+            if (keepOpen && how == merge)
+                continue;
+            EXPECT_EQ(inChild([&] {
+                          const LogCapture log;
+                          TagFile file;
+                          if (keepOpen && !file.readCacheFileForStudy(kStudy, true))
+                              return false;
+                          fill(file, 1, 9);
+                          fillDisk(before.size() + 50, SIG_IGN);
+                          return !how(file) && !file.failure().isEmpty() && log.count(named("")) == 1 &&
+                                 file.imagesByUID().size() == 9;
+                      }),
+                      1);
+        }
+    }
+    EXPECT_EQ(content(), before);
     EXPECT_FALSE(QFile::exists(journal()));
-    EXPECT_EQ(imagesFound(), 4);
 }
 
 TEST_F(TagFileCache, AFullDiskLeavesNoNewFile)
 {
-    for (const auto write : {writeWhole, mergeWhole}) {
+    const LogCapture log;
+    for (const auto how : {write, merge}) {
         EXPECT_EQ(inChild([&] {
-                      const LogCapture log;
-                      TagFile file;
-                      fill(file, 1, 3);
-                      fillDisk(100, WhenFull::Fail);
-                      return !write(file) && file.imagesByUID().size() == 3;
+                      fillDisk(100, SIG_IGN);
+                      return !put(1, 3, how);
                   }),
                   1);
-        EXPECT_FALSE(QFile::exists(path()));
-        EXPECT_FALSE(QFile::exists(journal()));
+        EXPECT_FALSE(QFile::exists(path()) || QFile::exists(journal()));
     }
 }
 
 TEST_F(TagFileCache, AWriterThatDiesWhileItPreparesHasChangedNothing)
 {
-    build(4);
-    const QByteArray before = contentOf(path());
+    ASSERT_TRUE(put(1, 4, write));
+    const QByteArray before = content();
     EXPECT_EQ(inChild([&] {
-                  fillDisk(before.size() + 50, WhenFull::Die);
-                  return merge(1, 9);
+                  fillDisk(before.size() + 50, SIG_DFL);
+                  return put(1, 9, merge);
               }),
               -SIGXFSZ);
     EXPECT_TRUE(QFile::exists(journal()));
     EXPECT_EQ(imagesFound(), 4);
-    EXPECT_EQ(contentOf(path()), before);
+    EXPECT_EQ(content(), before);
     EXPECT_FALSE(QFile::exists(journal()));
 }
 
@@ -355,16 +297,17 @@ class DeadWriter : public TagFileCache, public testing::WithParamInterface<Death
 protected:
     void SetUp() override
     {
-        build(9);
-        const QByteArray wanted = contentOf(path());
-        build(4);
-        const QByteArray before = contentOf(path());
+        ASSERT_TRUE(put(1, 9, write));
+        const QByteArray wanted = content();
+        ASSERT_TRUE(put(1, 4, write));
         const int done = wanted.size() * GetParam().writtenPercent / 100;
-        put(path(), wanted.left(done) + before.mid(done));
         QByteArray left = journalOf(wanted);
         left.chop(GetParam().journalCut);
+        put(path(), wanted.left(done) + content().mid(done));
         put(journal(), left);
     }
+
+    void TearDown() override { EXPECT_FALSE(QFile::exists(journal())); }
 };
 
 TEST_P(DeadWriter, IsFinishedByTheNextReader)
@@ -379,20 +322,18 @@ TEST_P(DeadWriter, IsFinishedByWhoeverKeepsTheFileOpen)
     TagFile file;
     ASSERT_TRUE(file.readCacheFileForStudy(kStudy, true));
     EXPECT_EQ(file.imagesByUID().size(), GetParam().images);
-    EXPECT_FALSE(QFile::exists(journal()));
 }
 
 TEST_P(DeadWriter, IsFinishedByTheNextMerge)
 {
-    EXPECT_TRUE(merge(10, 10));
+    EXPECT_TRUE(put(10, 10, merge));
     EXPECT_EQ(imagesFound(), GetParam().images + 1);
-    EXPECT_FALSE(QFile::exists(journal()));
 }
 
 TEST_P(DeadWriter, OfANewFileIsFinishedToo)
 {
     put(path(), "");
-    EXPECT_TRUE(merge(10, 10));
+    EXPECT_TRUE(put(10, 10, merge));
     EXPECT_EQ(imagesFound(), GetParam().journalCut == 0 ? 10 : 1);
 }
 

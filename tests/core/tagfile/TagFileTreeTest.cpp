@@ -1,145 +1,78 @@
-#include "kddlib/tagfile/TagFile.h"
-#include "kddlib/tagmodel/TagElement.h"
-#include "kddlib/tagmodel/TagMap.h"
+#include "TagFileFixture.h"
 #include "kddlib/volumes/Volume.h"
-#include "support/DatasetBuilder.h"
-#include "support/LogCapture.h"
-#include "support/TemporaryStore.h"
-#include "support/TreeText.h"
-
-#include <QDataStream>
-
-#include <gtest/gtest.h>
 
 #include <array>
-#include <memory>
 
 using namespace Kdd;
 
 namespace
 {
 
-const DcmTagKey kFilePath(0x0006, 0x7100);
-const DcmTagKey kPreview(0x0006, 0x7105);
-
-using Uids = QList<QByteArray>;
+using TagFileTree = TagFileTest;
 using Counters = std::array<int, 11>;
 
-enum Counter {
-    Series,
-    Images,
-    Volumes,
-    Blobs,
-    OptimiseMs,
-    ReadMs,
-    WriteMs,
-    StoredSize,
-    UncompressedSize,
-    UnoptimisedSize,
-    BlobBytes,
-};
-
+/// In their order, without the times.
 Counters countersOf(const TagFile& file)
 {
     Counters all = {};
-    file.getStatistics(all[Series], all[Images], all[Volumes], all[Blobs], all[OptimiseMs], all[ReadMs],
-                       all[WriteMs], all[StoredSize], all[UncompressedSize], all[UnoptimisedSize],
-                       all[BlobBytes]);
+    file.getStatistics(all[0], all[1], all[2], all[3], all[4], all[5], all[6], all[7], all[8], all[9],
+                       all[10]);
+    all[4] = all[5] = all[6] = 0;
     return all;
 }
 
-TagMap* add(TagFile& file, const DatasetBuilder& image, const char* path = nullptr)
-{
-    return file.addTagMap(image.map(), path, false);
-}
-
-/// What an image shows that is no part of a tree.
-std::string shownAlone(const DatasetBuilder& image)
-{
-    return shownText(*std::unique_ptr<TagMap>(image.map()));
-}
-
-QByteArray written(TagFile& file, TagFile::CompressionMode mode)
-{
-    TagFile::setCompressionMode(mode);
-    QByteArray content;
-    QDataStream out(&content, QIODevice::WriteOnly);
-    EXPECT_TRUE(file.writeCacheFile(out));
-    TagFile::setCompressionMode(TagFile::CompressionMode::Zlib);
-    return content;
-}
-
-TEST(TagFileTree, KeepsTheFirstOfTwoImagesOfOneUid)
-{
-    TagFile file;
-    const DatasetBuilder first = anImage("1").with(DCM_ImageComments, "first");
-    TagMap* placed = add(file, first);
-    EXPECT_EQ(add(file, anImage("1").with(DCM_ImageComments, "second")), nullptr);
-    EXPECT_EQ(file.findImage("1"), placed);
-    EXPECT_EQ(shownText(*placed), shownAlone(first));
-}
-
-TEST(TagFileTree, ReplacesAnImageAndDropsTheSeriesThatItLeavesEmpty)
+TEST_F(TagFileTree, KeepsTheFirstOfTwoImagesUnlessToldToReplaceIt)
 {
     for (const char* seriesUID : {"1.2.3", "1.2.4"}) {
         TagFile file;
-        add(file, anImage("1").with(DCM_PatientID, "first"));
+        TagMap* first = add(file, anImage("1").with(DCM_PatientID, "first"));
         const DatasetBuilder second = anImage("1").inSeries(seriesUID).with(DCM_ImageComments, "second");
+        EXPECT_EQ(file.addTagMap(second.map(), nullptr, false), nullptr);
+        EXPECT_EQ(file.findImage("1"), first);
         TagMap* placed = file.addTagMap(second.map(), nullptr, true);
         ASSERT_NE(placed, nullptr);
         EXPECT_EQ(file.findImage("1"), placed);
-        EXPECT_EQ(file.seriesByUID().keys(), Uids{seriesUID});
-        EXPECT_EQ(file.study()->children().size(), 1);
         EXPECT_EQ(shownText(*placed), shownAlone(second));
+        EXPECT_EQ(file.seriesByUID().keys(), Uids{seriesUID}) << "the series that became empty is gone";
+        EXPECT_EQ(file.study()->children().size(), 1);
     }
 }
 
-TEST(TagFileTree, RefusesWhatBelongsNowhere)
+TEST_F(TagFileTree, RefusesWhatBelongsNowhere)
 {
     TagFile file;
     EXPECT_EQ(add(file, anImage().without(DCM_SOPInstanceUID)), nullptr) << "known by nothing";
     EXPECT_TRUE(file.isEmpty());
     add(file, anImage("1").inStudy("1.2"));
-    EXPECT_EQ(add(file, anImage("2").inStudy("1.2.0")), nullptr) << "of another study";
-    EXPECT_EQ(file.addTagMap(anImage("1").inStudy("1.2.0").map(), nullptr, true), nullptr);
-    EXPECT_EQ(file.imagesByUID().keys(), Uids{"1"});
+    EXPECT_EQ(add(file, anImage("1").inStudy("1.2.0")), nullptr) << "of another study";
     EXPECT_EQ(file.studyInstanceUID(), "1.2");
+    const LogCapture log;
+    EXPECT_EQ(file.addDicomFile("/no/such/file", nullptr, false), nullptr);
+    EXPECT_EQ(log.count("Could not load /no/such/file: "), 1);
+    EXPECT_EQ(file.imagesByUID().keys(), Uids{"1"});
 }
 
-TEST(TagFileTree, AFreshOneCountsNothing)
-{
-    EXPECT_EQ(countersOf(TagFile()), Counters{});
-    TagFile file;
-    add(file, anImage());
-    Counters expected = {};
-    expected[Series] = expected[Images] = 1;
-    EXPECT_EQ(countersOf(file), expected);
-}
-
-TEST(TagFileTree, CountsWhatItWrote)
+TEST_F(TagFileTree, CountsWhatItHoldsAndWrote)
 {
     TagFile file;
+    EXPECT_EQ(countersOf(file), Counters{});
     for (const char* uid : {"1", "2", "3"})
         add(file, anImage(uid).withLong(DCM_ImageComments, 200));
+    EXPECT_EQ(countersOf(file), (Counters{1, 3}));
     file.findImage("1")->putAndInsertValue(kPreview, VrCode::OB, QByteArray(100, 'p'));
     file.findSeries("1.2.3")->addBareVolume(new Volume);
-    const int unoptimised = written(file, TagFile::CompressionMode::None).size();
+    const int unoptimised = written(file).size();
     TagFile::setDebugOptions(TagFile::kMeasureUnoptimised);
     file.optimizeAll();
     TagFile::setDebugOptions(0);
-    const int uncompressed = written(file, TagFile::CompressionMode::None).size();
-    const int stored = written(file, TagFile::CompressionMode::Zlib).size();
-    Counters counters = countersOf(file);
-    EXPECT_EQ(counters[UnoptimisedSize], unoptimised);
-    counters[OptimiseMs] = counters[WriteMs] = 0;
-    EXPECT_EQ(counters, (Counters{1, 3, 1, 1, 0, 0, 0, stored, uncompressed, unoptimised, 100}));
+    const int uncompressed = written(file).size();
+    const int stored = written(file, Mode::Zlib).size();
+    EXPECT_EQ(countersOf(file), (Counters{1, 3, 1, 1, 0, 0, 0, stored, uncompressed, unoptimised, 100}));
     file.clear();
-    counters = countersOf(file);
-    counters[WriteMs] = 0;
-    EXPECT_EQ(counters, Counters{});
+    EXPECT_EQ(countersOf(file), Counters{});
 }
 
-TEST(TagFileTree, RemovingTheLastImageEmptiesIt)
+TEST_F(TagFileTree, RemovingTheLastImageEmptiesIt)
 {
     TagFile file;
     add(file, anImage("1"));
@@ -150,18 +83,16 @@ TEST(TagFileTree, RemovingTheLastImageEmptiesIt)
     EXPECT_EQ(file.removeImages(4, uids), 2);
     EXPECT_EQ(file.seriesByUID().keys(), Uids{"1.2.3"});
     EXPECT_EQ(file.removeImages(1, uids + 4), 1);
-    EXPECT_TRUE(file.isEmpty());
-    EXPECT_TRUE(file.studyInstanceUID().isEmpty());
-    EXPECT_EQ(file.study(), nullptr);
+    EXPECT_TRUE(file.isEmpty() && file.studyInstanceUID().isEmpty() && file.study() == nullptr);
     EXPECT_EQ(countersOf(file), Counters{});
     EXPECT_NE(add(file, anImage("1").inStudy("another")), nullptr);
 }
 
-TEST(TagFileTree, RemovingASeriesTakesItsImagesOutOfTheIndex)
+TEST_F(TagFileTree, RemovingASeriesTakesItsImagesOutOfTheIndex)
 {
     TagFile file;
     add(file, anImage("1"));
-    add(file, anImage("2"));
+    add(file, anImage().without(DCM_SOPInstanceUID), "/known/by/its/path.dcm");
     add(file, anImage("3").inSeries("1.2.4"));
     const std::string third = shownText(*file.findImage("3"));
     const char* uids[] = {"1.2.3", "unknown", "1.2.3", "1.2.4"};
@@ -169,11 +100,10 @@ TEST(TagFileTree, RemovingASeriesTakesItsImagesOutOfTheIndex)
     EXPECT_EQ(file.imagesByUID().keys(), Uids{"3"});
     EXPECT_EQ(shownText(*file.findImage("3")), third);
     EXPECT_EQ(file.removeSeries(1, uids + 3), 1);
-    EXPECT_TRUE(file.isEmpty());
-    EXPECT_TRUE(file.imagesByUID().isEmpty());
+    EXPECT_TRUE(file.isEmpty() && file.imagesByUID().isEmpty());
 }
 
-TEST(TagFileTree, ASuffixPassesOverImagesThatHaveAnother)
+TEST_F(TagFileTree, ASuffixPassesOverImagesThatHaveAnother)
 {
     TagFile file;
     add(file, anImage("1"), "/store/1_a.dcm");
@@ -181,43 +111,40 @@ TEST(TagFileTree, ASuffixPassesOverImagesThatHaveAnother)
     EXPECT_EQ(file.findImage("1", ""), file.findImage("1"));
     EXPECT_EQ(file.findImage("1", "a"), file.findImage("1"));
     EXPECT_EQ(file.findImage("1", "ab"), nullptr);
-    EXPECT_EQ(file.findImage("2", "a"), file.findImage("2"));
+    EXPECT_EQ(file.findImage("2", "a"), file.findImage("2")) << "it has none";
     EXPECT_EQ(file.findImage("3", "a"), nullptr);
 }
 
-TEST(TagFileTree, TheMetaFolderEndsInASlash)
+TEST_F(TagFileTree, TheMetaFolderEndsInASlash)
 {
     const LogCapture log;
-    const char* const rows[][2] = {
-        {"", "./"}, {"C:\\data", "C:/data/"}, {"/meta/", "/meta/"}, {"meta", "meta/"}};
-    for (const auto& row : rows) {
-        TagFile::setMetaFolder(row[0]);
-        EXPECT_STREQ(TagFile::metaFolder(), row[1]);
+    for (const auto& [given, kept] : {std::pair("", "./"), {"C:\\data", "C:/data/"}, {"/meta/", "/meta/"}}) {
+        TagFile::setMetaFolder(given);
+        EXPECT_STREQ(TagFile::metaFolder(), kept);
     }
     EXPECT_EQ(log.count("Meta folder set to C:/data/"), 1);
 }
 
-TEST(TagFileTree, ATakenImageShowsAllThatItShowedAndLeavesItsSeries)
+TEST_F(TagFileTree, ATakenImageShowsAllThatItShowedAndLeavesItsSeries)
 {
     TagFile file;
-    add(file, anImage("1").withItem(DCM_RequestAttributesSequence, anItem().with(DCM_CodeValue, "c")));
-    const DatasetBuilder second =
-        anImage("2").withItem(DCM_RequestAttributesSequence, anItem().with(DCM_CodeValue, "d"));
-    add(file, second);
+    const auto image = [](const char* uid) {
+        return anImage(uid).withItem(DCM_RequestAttributesSequence, anItem().with(DCM_CodeValue, uid));
+    };
+    add(file, image("1"));
+    add(file, image("2"));
     const std::unique_ptr<TagMap> taken(file.takeImage("2"));
     ASSERT_NE(taken, nullptr);
-    EXPECT_EQ(shownText(*taken), shownAlone(second));
     EXPECT_EQ(file.takeImage("2"), nullptr);
     const std::unique_ptr<TagMap> last(file.takeImage("1"));
     EXPECT_NE(file.findSeries("1.2.3"), nullptr);
     EXPECT_TRUE(file.imagesByUID().isEmpty());
     file.deleteEmptyNodes();
-    EXPECT_TRUE(file.isEmpty());
-    EXPECT_EQ(file.findSeries("1.2.3"), nullptr);
-    EXPECT_EQ(shownText(*taken), shownAlone(second)) << "also without its tree";
+    EXPECT_TRUE(file.isEmpty() && file.seriesByUID().isEmpty());
+    EXPECT_EQ(shownText(*taken), shownAlone(image("2"))) << "also without its tree";
 }
 
-TEST(TagFileTree, OnlyAFilePathOfItsOwnKeepsAnImage)
+TEST_F(TagFileTree, OnlyAFilePathOfItsOwnKeepsAnImage)
 {
     TagFile file;
     for (const char* uid : {"1", "2", "3"})
@@ -229,45 +156,22 @@ TEST(TagFileTree, OnlyAFilePathOfItsOwnKeepsAnImage)
     EXPECT_EQ(file.findSeries("1.2.3")->children(), QList<TagMap*>{file.findImage("2")});
 }
 
-TEST(TagFileTree, AFileThatCannotBeLoadedIsLogged)
+TEST_F(TagFileTree, AnImageWithoutSopInstanceUidIsKnownByItsPathForGood)
 {
-    const LogCapture log;
-    TagFile file;
-    EXPECT_EQ(file.addDicomFile("/no/such/file", nullptr, false), nullptr);
-    EXPECT_EQ(log.count("Could not load /no/such/file: "), 1);
-    EXPECT_TRUE(file.isEmpty());
-}
-
-DatasetBuilder anImageWithoutUid(const char* comment)
-{
-    return anImage().without(DCM_SOPInstanceUID).with(DCM_ImageComments, comment);
-}
-
-TEST(TagFileTree, AnImageWithoutSopInstanceUidIsKnownByItsPathForGood)
-{
-    const TemporaryStore store;
+    const DatasetBuilder image = anImage().without(DCM_SOPInstanceUID);
     TagFile first;
-    add(first, anImageWithoutUid("a"), "/a.dcm");
-    add(first, anImageWithoutUid("b"), "/b.dcm");
+    add(first, image, "/a.dcm");
+    add(first, image, "/b.dcm");
     EXPECT_EQ(first.imagesByUID().keys(), (Uids{"/a.dcm", "/b.dcm"}));
     ASSERT_TRUE(first.mergeIntoCacheFile());
     TagFile second;
-    add(second, anImageWithoutUid("b again"), "/b.dcm");
-    add(second, anImageWithoutUid("c"), "/c.dcm");
+    add(second, image, "/b.dcm");
+    add(second, image, "/c.dcm");
     ASSERT_TRUE(second.mergeIntoCacheFile());
     TagFile read;
     ASSERT_TRUE(read.readCacheFileForStudy("1.2", false));
     EXPECT_EQ(read.imagesByUID().keys(), (Uids{"/a.dcm", "/b.dcm", "/c.dcm"}));
     EXPECT_EQ(imagesText(read), imagesText(second));
-}
-
-TEST(TagFileTree, AnImageWithoutSopInstanceUidLeavesNoTraceWhenItGoes)
-{
-    TagFile file;
-    add(file, anImageWithoutUid("a"), "/a.dcm");
-    const char* seriesUID = "1.2.3";
-    EXPECT_EQ(file.removeSeries(1, &seriesUID), 1);
-    EXPECT_TRUE(file.imagesByUID().isEmpty());
 }
 
 /// A volume of the images that a builder of volumes has found.
@@ -281,7 +185,7 @@ public:
     }
 };
 
-TEST(TagFileTree, VolumesForgetTheImagesThatGo)
+TEST_F(TagFileTree, VolumesForgetTheImagesThatGo)
 {
     TagFile file;
     for (const char* uid : {"1", "2", "3", "4"})
@@ -291,7 +195,7 @@ TEST(TagFileTree, VolumesForgetTheImagesThatGo)
     const char* uid = "1";
     EXPECT_EQ(file.removeImages(1, &uid), 1);
     delete file.takeImage("2");
-    file.addTagMap(anImage("3").map(), nullptr, true);
+    add(file, anImage("3"));
     ASSERT_EQ(volume->numImages(), 1);
     EXPECT_EQ(volume->image(0), file.findImage("4"));
 }

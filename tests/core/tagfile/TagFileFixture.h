@@ -1,0 +1,101 @@
+#pragma once
+
+#include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagmodel/TagElement.h"
+#include "kddlib/tagmodel/TagMap.h"
+#include "support/DatasetBuilder.h"
+#include "support/LogCapture.h"
+#include "support/TemporaryStore.h"
+#include "support/TreeText.h"
+
+#include <QDataStream>
+#include <QDir>
+#include <QFile>
+#include <QFileInfo>
+
+#include <gtest/gtest.h>
+
+#include <map>
+#include <memory>
+
+namespace Kdd
+{
+
+using Mode = TagFile::CompressionMode;
+using Uids = QList<QByteArray>;
+
+constexpr Mode kModes[] = {Mode::None, Mode::Zlib, Mode::Lzma};
+constexpr int kHeaderSize = 12;  // of a file, with the size of its body
+const DcmTagKey kFilePath(0x0006, 0x7100);
+const DcmTagKey kPreview(0x0006, 0x7105);
+
+/// A store of its own and the words in which tests speak of tag files.
+class TagFileTest : public testing::Test
+{
+protected:
+    static TagMap* add(TagFile& file, const DatasetBuilder& image, const char* path = nullptr)
+    {
+        return file.addTagMap(image.map(), path, true);
+    }
+
+    /// What an image shows that is no part of a tree.
+    static std::string shownAlone(const DatasetBuilder& image)
+    {
+        return shownText(*std::unique_ptr<TagMap>(image.map()));
+    }
+
+    /// The content of a tag file.
+    static QByteArray written(TagFile& file, Mode mode = Mode::None)
+    {
+        TagFile::setCompressionMode(mode);
+        QByteArray content;
+        QDataStream out(&content, QIODevice::WriteOnly);
+        EXPECT_TRUE(file.writeCacheFile(out));
+        TagFile::setCompressionMode(Mode::Zlib);
+        return content;
+    }
+
+    /// The same around any body, as it is stored.
+    static QByteArray framed(const QByteArray& stored, Mode mode = Mode::None)
+    {
+        QByteArray content("TaCa\0\0\2", 7);
+        QDataStream out(&content, QIODevice::WriteOnly | QIODevice::Append);
+        out << static_cast<quint8>(mode) << stored
+            << qint32(0);  // a byte array and a body have the same form
+        return content;
+    }
+
+    static int bodySize(const QByteArray& content)
+    {
+        return content.mid(kHeaderSize - 4, 4).toHex().toInt(nullptr, 16);
+    }
+
+    static bool read(TagFile& file, const QByteArray& content, const char* studyUID = nullptr)
+    {
+        QDataStream in(content);
+        return file.readCacheFile(in, studyUID);
+    }
+
+    /// The file of the study that images belong to by default.
+    static QString path() { return TagFile::cacheFilePathForStudy("1.2"); }
+    static QString journal() { return path() + QStringLiteral(".journal"); }
+    static std::string named(const char* message) { return message + path().toStdString(); }
+
+    static void put(const QString& name, const QByteArray& content)
+    {
+        QDir().mkpath(QFileInfo(name).path());
+        QFile file(name);
+        ASSERT_TRUE(file.open(QIODevice::WriteOnly));
+        ASSERT_EQ(file.write(content), content.size());
+    }
+
+    static QByteArray content(const QString& name = path())
+    {
+        QFile file(name);
+        return file.open(QIODevice::ReadOnly) ? file.readAll() : QByteArray("(no file)");
+    }
+
+    TemporaryStore mStore;
+};
+
+}  // namespace Kdd
