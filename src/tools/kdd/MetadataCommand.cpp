@@ -29,7 +29,7 @@ void collectImages(const TagMap& node, QList<const TagMap*>& images)
 
 }  // namespace
 
-Outcome runMetadata(const GlobalOptions&, const NodeSelection& selection)
+Outcome runMetadata(const GlobalOptions& /*options*/, const NodeSelection& selection)
 {
     TagFile file;
     const TagMap* node = findNode(selection, file);

@@ -42,7 +42,7 @@ void printTable(const QList<QStringList>& rows)
 QString humanBytes(qint64 bytes)
 {
     const char* const units[] = {"B", "KB", "MB", "GB", "TB"};
-    double value = static_cast<double>(bytes);
+    auto value = static_cast<double>(bytes);
     int unit = 0;
     while (value >= 1000 && unit < 4) {
         value /= 1000;

@@ -21,15 +21,16 @@ Outcome runSample(const GlobalOptions& options, const SampleRequest& request)
         LogFile::errorf("%s", qUtf8Printable(summary.failure));
         return Outcome::Failed;
     }
-    if (options.json)
+    if (options.json) {
         printJson({{QStringLiteral("studies"), summary.studies},
                    {QStringLiteral("series"), summary.series},
                    {QStringLiteral("images"), summary.images},
                    {QStringLiteral("bytes"), summary.bytes}});
-    else if (!options.quiet)
+    } else if (!options.quiet) {
         std::printf("%d studies, %d series, %d images, %s in %s\n", summary.studies, summary.series,
                     summary.images, qUtf8Printable(humanBytes(summary.bytes)),
                     qUtf8Printable(request.folder));
+    }
     return Outcome::Done;
 }
 

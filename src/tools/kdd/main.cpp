@@ -126,7 +126,7 @@ public:
     }
 
 private:
-    CLI::App& declare(const char* name, const char* description, Command command)
+    CLI::App& declare(const char* name, const char* description, const Command& command)
     {
         CLI::App* subcommand = mApp.add_subcommand(name, description);
         subcommand->fallthrough();

@@ -58,7 +58,7 @@ void TagFile::setMetaFolder(const char* path)
 /// The name under which an image is indexed: its SOP Instance UID, and where it has none its file path.
 QByteArray TagFile::imageKey(const TagMap& image)
 {
-    const QByteArray sopUID = image.uid(TagMap::ImageLevel);
+    QByteArray sopUID = image.uid(TagMap::ImageLevel);
     if (!sopUID.isEmpty())
         return sopUID;
     QByteArray path;
