@@ -18,6 +18,9 @@ constexpr qint64 kMaxBodySize = qint64(256) * 1024 * 1024;
 /// bytes on each of ninety million.
 constexpr int kMaxElements = 16 * 1000 * 1000;
 
+/// Images of one tag file that a later one of the same UID replaces.
+constexpr int kMaxReplacedImages = 100;
+
 /// Slices of a volume whose list is not stored because it is in order.
 constexpr int kMaxRun = 1000 * 1000;
 

@@ -263,7 +263,11 @@ private:
     {
         TagMap* image = readBelow(record, mSeries);
         const QByteArray key = imageKey(*image);
-        delete mFile.mImages.value(key, nullptr);
+        // No file of ours holds an image twice; in a hostile one each would be searched for among its siblings.
+        TagMap* replaced = mFile.mImages.value(key, nullptr);
+        if (replaced != nullptr && ++mReplacedImages > kMaxReplacedImages)
+            return false;
+        delete replaced;
         mFile.mImages.insert(key, image);
         return !record.failed();
     }
@@ -289,6 +293,7 @@ private:
     TagMap::RecordContext mContext;
     TagMap* mStudy = nullptr;
     TagMap* mSeries = nullptr;
+    int mReplacedImages = 0;
 };
 
 bool TagFile::readCacheFile(QDataStream& in, const char* studyUID)
