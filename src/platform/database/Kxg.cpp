@@ -1,0 +1,168 @@
+#include "platform/database/Kxg.h"
+
+#include "platform/base/LogFile.h"
+#include "platform/database/FileKind.h"
+#include "platform/database/QuestionConnection.h"
+#include "platform/database/SqlConnection.h"
+#include "platform/database/StudyContent.h"
+
+#include <QHash>
+
+#include <algorithm>
+#include <set>
+
+namespace Kxg
+{
+namespace
+{
+
+constexpr int kDicom = static_cast<int>(FileKind::Dicom);
+constexpr int kVolume = static_cast<int>(FileKind::Volume);
+
+struct StudyFiles
+{
+    std::vector<std::string> dicom, volumes;
+    std::set<std::string> withVolume;  // series, in the order of their bytes
+};
+
+StudyFiles readFiles(SqlConnection& connection, int studyId)
+{
+    StudyFiles files;
+    SqlRows rows = connection.ask("SELECT file.kind, file.path, series.uid FROM series"
+                                  " JOIN file ON file.series_id = series.id"
+                                  " WHERE series.study_id = ? ORDER BY file.path",
+                                  {studyId});
+    while (rows.next()) {
+        const bool isVolume = rows.number(0) == kVolume;
+        (isVolume ? files.volumes : files.dicom).push_back(rows.bytes(1).toStdString());
+        if (isVolume)
+            files.withVolume.insert(rows.text(2).toStdString());
+    }
+    // A study goes with its last file.
+    if (files.dicom.empty() && files.volumes.empty())
+        throw DatabaseError(QStringLiteral("there is no study of id %1").arg(studyId));
+    return files;
+}
+
+DicomDirectoryEntry seriesEntry(const SqlRows& rows, const QByteArray& studyUID)
+{
+    DicomDirectoryEntry series;
+    series.type = DicomDirectoryEntry::SeriesEntry;
+    series.studyInstanceUID = studyUID;
+    series.seriesInstanceUID = rows.text(0);
+    series.seriesNumber = rows.text(1);
+    series.seriesDescription = rows.text(2);
+    series.modality = rows.text(3);
+    series.seriesDate = rows.text(4);
+    series.seriesTime = rows.text(5);
+    series.stationName = rows.text(6);
+    return series;
+}
+
+DicomDirectoryEntry volumeEntry(const DicomDirectoryEntry& series, const QByteArray& path)
+{
+    DicomDirectoryEntry file;
+    file.type = DicomDirectoryEntry::VolumeFile;
+    file.flags = DicomDirectoryEntry::HasVolume;
+    file.name = path.mid(path.lastIndexOf('/') + 1);
+    file.studyInstanceUID = series.studyInstanceUID;
+    file.seriesInstanceUID = series.seriesInstanceUID;
+    return file;
+}
+
+void readSeries(SqlConnection& connection, qint64 studyId, int limit, DicomDirectoryEntry& study)
+{
+    SqlRows rows =
+        connection.ask("SELECT uid, series_number, series_description, modality, series_date, series_time,"
+                       " station_name FROM series WHERE study_id = ? ORDER BY uid LIMIT ?",
+                       {studyId, std::max(0, limit)});
+    while (rows.next())
+        study.entries.push_back(seriesEntry(rows, study.studyInstanceUID));
+}
+
+void readVolumes(SqlConnection& connection, qint64 studyId, DicomDirectoryEntry& study)
+{
+    QHash<QByteArray, DicomDirectoryEntry*> bySeries;
+    for (DicomDirectoryEntry& series : study.entries)
+        bySeries.insert(series.seriesInstanceUID, &series);
+    SqlRows rows =
+        connection.ask("SELECT series.uid, file.path FROM series JOIN file ON file.series_id = series.id"
+                       " WHERE series.study_id = ? AND file.kind = ? ORDER BY file.path",
+                       {studyId, kVolume});
+    while (rows.next())
+        if (DicomDirectoryEntry* series = bySeries.value(rows.text(0)))
+            series->entries.push_back(volumeEntry(*series, rows.bytes(1)));
+    for (DicomDirectoryEntry& series : study.entries)
+        std::stable_sort(series.entries.begin(), series.entries.end(),
+                         [](const auto& a, const auto& b) { return a.name < b.name; });
+}
+
+}  // namespace
+
+Kdd::Result GetAllFilesOfStudy(const QByteArray& user, int studyId, std::vector<std::string>& dicomFiles,
+                               std::vector<std::string>& volumeFiles, std::vector<std::string>& seriesUIDs)
+{
+    return askDatabase([&](SqlConnection& connection) {
+        noteUser(connection, user);
+        StudyFiles files = readFiles(connection, studyId);
+        dicomFiles.swap(files.dicom);
+        volumeFiles.swap(files.volumes);
+        seriesUIDs.assign(files.withVolume.begin(), files.withVolume.end());
+    });
+}
+
+Kdd::Result GetStudy(const QByteArray& studyUID, int limit, std::shared_ptr<DicomDirectoryEntry>& study)
+{
+    study.reset();
+    return askDatabase([&](SqlConnection& connection) {
+        const qint64 studyId = findStudyId(connection, studyUID);
+        if (studyId == 0)
+            return;
+        const auto entry = std::make_shared<DicomDirectoryEntry>();
+        entry->studyInstanceUID = studyUID;
+        readSeries(connection, studyId, limit, *entry);
+        readVolumes(connection, studyId, *entry);
+        study = entry;
+    });
+}
+
+Kdd::Result GetSeries(const QByteArray& studyUID, QMap<QByteArray, std::shared_ptr<SeriesInfo>>& series)
+{
+    return askDatabase([&](SqlConnection& connection) {
+        QMap<QByteArray, std::shared_ptr<SeriesInfo>> found;
+        SqlRows rows = connection.ask("SELECT series.uid, file.sop_uid, file.path FROM study"
+                                      " JOIN series ON series.study_id = study.id"
+                                      " JOIN file ON file.series_id = series.id"
+                                      " WHERE study.uid = ? AND file.kind = ? ORDER BY file.path",
+                                      {textValue(studyUID), kDicom});
+        while (rows.next()) {
+            std::shared_ptr<SeriesInfo>& info = found[rows.text(0)];
+            if (!info) {
+                info = std::make_shared<SeriesInfo>();
+                info->seriesInstanceUID = rows.text(0);
+            }
+            info->images.push_back({rows.text(1), rows.bytes(2)});
+        }
+        series.swap(found);
+    });
+}
+
+QByteArray GetGlobalConfig(const QByteArray& section, const QByteArray& key, const QByteArray& fallback)
+{
+    QByteArray value = fallback;
+    // A program that works without a database has nothing to be warned of.
+    if (DatabaseServer().isEmpty())
+        return value;
+    const Kdd::Result result = askDatabase([&](SqlConnection& connection) {
+        SqlRows rows = connection.ask("SELECT value FROM config WHERE section = ? AND name = ?",
+                                      {textValue(section), textValue(key)});
+        if (rows.next())
+            value = rows.bytes(0);
+    });
+    if (result.bad())
+        Kdd::LogFile::warnf("Cannot read configuration value %s/%s, \"%s\" is taken: %s", section.constData(),
+                            key.constData(), fallback.constData(), qUtf8Printable(result.text()));
+    return value;
+}
+
+}  // namespace Kxg

@@ -1,0 +1,233 @@
+#include "platform/database/SqlCatalogue.h"
+
+#include "platform/database/FileKind.h"
+#include "platform/database/FileRegistration.h"
+#include "platform/database/Schema.h"
+#include "platform/database/StudyContent.h"
+
+#include <algorithm>
+
+namespace Kxg
+{
+namespace
+{
+
+constexpr int kDicom = static_cast<int>(FileKind::Dicom);
+constexpr int kVolume = static_cast<int>(FileKind::Volume);
+
+QByteArray joined(const QSet<QByteArray>& texts)
+{
+    QList<QByteArray> sorted = texts.values();
+    std::sort(sorted.begin(), sorted.end());
+    return sorted.join(' ');
+}
+
+QByteArray withoutSlash(QByteArray path)
+{
+    while (path.endsWith('/'))
+        path.chop(1);
+    return path;
+}
+
+/// One row for each series, the series of a study together.
+const char kListSeries[] =
+    "SELECT study.id, study.uid, study.patient_name, study.patient_id, study.study_date,"
+    " EXISTS (SELECT 1 FROM build_request WHERE build_request.study_id = study.id), series.modality,"
+    " SUM(CASE WHEN file.kind = ? THEN 1 ELSE 0 END), SUM(CASE WHEN file.kind = ? THEN 1 ELSE 0 END)"
+    " FROM study JOIN series ON series.study_id = study.id JOIN file ON file.series_id = series.id"
+    " GROUP BY study.id, series.id ORDER BY study.uid, series.id";
+
+StudySummary summaryOf(const SqlRows& rows)
+{
+    StudySummary study;
+    study.id = static_cast<int>(rows.number(0));
+    study.studyInstanceUID = rows.text(1);
+    study.patientName = rows.text(2);
+    study.patientID = rows.text(3);
+    study.studyDate = rows.text(4);
+    study.isWaiting = rows.truth(5);
+    return study;
+}
+
+}  // namespace
+
+std::unique_ptr<Catalogue> Catalogue::open(const QByteArray& address, Kdd::Result& result)
+{
+    std::unique_ptr<Catalogue> catalogue;
+    DatabaseAddress parsed;
+    result = DatabaseAddress::parse(address, parsed);
+    if (result.good())
+        result = attempt(parsed, [&] { catalogue = std::make_unique<SqlCatalogue>(parsed); });
+    return catalogue;
+}
+
+SqlCatalogue::SqlCatalogue(const DatabaseAddress& address)
+    : mConnection(address, SqlConnection::IfAbsent::Create)
+{
+    bringSchemaUpToDate(mConnection);
+}
+
+Kdd::Result SqlCatalogue::transact(Access access, const std::function<void()>& work)
+{
+    return attempt(mConnection.address(), [&] { mConnection.transact(access, work); });
+}
+
+// ---- files
+
+Kdd::Result SqlCatalogue::knownFiles(const QByteArray& path, QHash<QByteArray, FileStamp>& stamps)
+{
+    const QByteArray folder = withoutSlash(path);
+    return transact(Access::Read, [&] {
+        QHash<QByteArray, FileStamp> found;
+        // What lies below a folder is one range, since '0' is the byte after '/'.
+        SqlRows rows = mConnection.ask("SELECT path, size, modified FROM file WHERE path = ? UNION ALL"
+                                       " SELECT path, size, modified FROM file WHERE path >= ? AND path < ?",
+                                       {bytesValue(folder), folder + '/', folder + '0'});
+        while (rows.next())
+            found.insert(rows.bytes(0), {rows.number(1), rows.number(2)});
+        stamps.swap(found);
+    });
+}
+
+Kdd::Result SqlCatalogue::registerFiles(const FileRecords& files, QMap<QByteArray, qint64>& requests)
+{
+    QMap<QByteArray, qint64> left;
+    Kdd::Result result = transact(Access::Write, [&] { FileRegistration(mConnection).run(files, left); });
+    if (result.good())
+        requests.swap(left);
+    return result;
+}
+
+Kdd::Result SqlCatalogue::removeFiles(const QVector<QByteArray>& paths)
+{
+    return transact(Access::Write, [&] {
+        QSet<qint64> touched;
+        for (const QByteArray& path : paths) {
+            {
+                SqlRows rows = mConnection.ask("SELECT series.study_id FROM file JOIN series"
+                                               " ON series.id = file.series_id WHERE file.path = ?",
+                                               {bytesValue(path)});
+                if (rows.next())
+                    touched.insert(rows.number(0));
+            }
+            mConnection.change("DELETE FROM file WHERE path = ?", {bytesValue(path)});
+        }
+        QMap<QByteArray, qint64> requests;
+        for (const qint64 studyId : qAsConst(touched))
+            concludeChange(mConnection, studyId, requests);
+    });
+}
+
+Kdd::Result SqlCatalogue::removeFiles(const QByteArray& studyUID, const QByteArray& condition,
+                                      const QVariantList& values)
+{
+    return transact(Access::Write, [&] {
+        const qint64 studyId = findStudyId(mConnection, studyUID);
+        const QByteArray sql =
+            "DELETE FROM file WHERE series_id IN (SELECT id FROM series WHERE study_id = ?" + condition;
+        QMap<QByteArray, qint64> requests;
+        if (mConnection.change(sql, QVariantList{studyId} + values) > 0)
+            concludeChange(mConnection, studyId, requests);
+    });
+}
+
+Kdd::Result SqlCatalogue::removeStudy(const QByteArray& studyUID)
+{
+    return removeFiles(studyUID, ")", {});
+}
+
+Kdd::Result SqlCatalogue::removeSeries(const QByteArray& studyUID, const QByteArray& seriesUID)
+{
+    return removeFiles(studyUID, " AND uid = ?)", {textValue(seriesUID)});
+}
+
+Kdd::Result SqlCatalogue::removeImage(const QByteArray& studyUID, const QByteArray& sopUID)
+{
+    return removeFiles(studyUID, ") AND kind = ? AND sop_uid = ?", {kDicom, textValue(sopUID)});
+}
+
+// ---- studies
+
+Kdd::Result SqlCatalogue::listStudies(std::vector<StudySummary>& studies)
+{
+    return transact(Access::Read, [&] {
+        std::vector<StudySummary> list;
+        QSet<QByteArray> modalities;
+        SqlRows rows = mConnection.ask(kListSeries, {kDicom, kVolume});
+        while (rows.next()) {
+            if (list.empty() || list.back().id != rows.number(0)) {
+                list.push_back(summaryOf(rows));
+                modalities.clear();
+            }
+            StudySummary& study = list.back();
+            if (!rows.text(6).isEmpty())
+                modalities.insert(rows.text(6));
+            study.modalities = joined(modalities);
+            study.images += static_cast<int>(rows.number(7));
+            study.volumes += static_cast<int>(rows.number(8));
+            ++study.series;
+        }
+        studies.swap(list);
+    });
+}
+
+Kdd::Result SqlCatalogue::findStudies(const QByteArray& prefix, int limit, QVector<QByteArray>& studyUIDs)
+{
+    return transact(Access::Read, [&] {
+        QVector<QByteArray> found;
+        // No text that begins with the prefix comes after the prefix and the last of all characters.
+        const QVariant last = textValue(prefix + "\xF4\x8F\xBF\xBF");
+        SqlRows rows =
+            mConnection.ask("SELECT uid FROM study WHERE uid >= ? AND uid <= ? ORDER BY uid LIMIT ?",
+                            {textValue(prefix), last, std::max(0, limit)});
+        while (rows.next())
+            found.push_back(rows.text(0));
+        studyUIDs.swap(found);
+    });
+}
+
+Kdd::Result SqlCatalogue::volumeFiles(const QByteArray& studyUID, QVector<QByteArray>& paths)
+{
+    return transact(Access::Read, [&] {
+        QVector<QByteArray> found;
+        SqlRows rows = mConnection.ask("SELECT file.path FROM study JOIN series ON series.study_id = study.id"
+                                       " JOIN file ON file.series_id = series.id"
+                                       " WHERE study.uid = ? AND file.kind = ? ORDER BY file.path",
+                                       {textValue(studyUID), kVolume});
+        while (rows.next())
+            found.push_back(rows.bytes(0));
+        paths.swap(found);
+    });
+}
+
+// ---- the queue; what concerns claims stands with them
+
+Kdd::Result SqlCatalogue::waitingStudies(const QByteArray& path, QVector<QByteArray>& studyUIDs)
+{
+    const QByteArray folder = withoutSlash(path);
+    return transact(Access::Read, [&] {
+        QVector<QByteArray> found;
+        SqlRows rows =
+            mConnection.ask("SELECT DISTINCT study.uid FROM file JOIN series ON series.id = file.series_id"
+                            " JOIN study ON study.id = series.study_id"
+                            " JOIN build_request ON build_request.study_id = study.id"
+                            " WHERE file.path = ? OR (file.path >= ? AND file.path < ?) ORDER BY study.uid",
+                            {bytesValue(folder), bytesValue(folder + '/'), bytesValue(folder + '0')});
+        while (rows.next())
+            found.push_back(rows.text(0));
+        studyUIDs.swap(found);
+    });
+}
+
+// ---- configuration
+
+Kdd::Result SqlCatalogue::setConfig(const QByteArray& section, const QByteArray& key, const QByteArray& value)
+{
+    return transact(Access::Write, [&] {
+        mConnection.change("INSERT INTO config (section, name, value) VALUES (?, ?, ?)"
+                           " ON CONFLICT (section, name) DO UPDATE SET value = excluded.value",
+                           {textValue(section), textValue(key), bytesValue(value)});
+    });
+}
+
+}  // namespace Kxg

@@ -1,0 +1,47 @@
+#pragma once
+
+#include "platform/database/Catalogue.h"
+#include "platform/database/SqlConnection.h"
+
+namespace Kxg
+{
+
+/// The catalogue in an SQL database of either engine.
+class SqlCatalogue : public Catalogue
+{
+public:
+    /// Throws DatabaseError.
+    explicit SqlCatalogue(const DatabaseAddress& address);
+
+    Kdd::Result knownFiles(const QByteArray& path, QHash<QByteArray, FileStamp>& stamps) override;
+    Kdd::Result registerFiles(const FileRecords& files, QMap<QByteArray, qint64>& requests) override;
+    Kdd::Result removeFiles(const QVector<QByteArray>& paths) override;
+    Kdd::Result removeStudy(const QByteArray& studyUID) override;
+    Kdd::Result removeSeries(const QByteArray& studyUID, const QByteArray& seriesUID) override;
+    Kdd::Result removeImage(const QByteArray& studyUID, const QByteArray& sopUID) override;
+
+    Kdd::Result listStudies(std::vector<StudySummary>& studies) override;
+    Kdd::Result findStudies(const QByteArray& prefix, int limit, QVector<QByteArray>& studyUIDs) override;
+    Kdd::Result volumeFiles(const QByteArray& studyUID, QVector<QByteArray>& paths) override;
+
+    Kdd::Result requestBuild(const QVector<QByteArray>& studyUIDs) override;
+    Kdd::Result waitingStudies(const QByteArray& path, QVector<QByteArray>& studyUIDs) override;
+    Kdd::Result countWaiting(int& studies) override;
+    Kdd::Result claimNext(const QSet<int>& except, std::unique_ptr<StudyClaim>& claim) override;
+    Kdd::Result claim(const QByteArray& studyUID, int patienceMs,
+                      std::unique_ptr<StudyClaim>& claim) override;
+    Kdd::Result finishRequests(const QVector<qint64>& requests) override;
+
+    Kdd::Result setConfig(const QByteArray& section, const QByteArray& key, const QByteArray& value) override;
+
+private:
+    using Access = SqlConnection::Access;
+
+    Kdd::Result transact(Access access, const std::function<void()>& work);
+    Kdd::Result removeFiles(const QByteArray& studyUID, const QByteArray& condition,
+                            const QVariantList& values);
+
+    SqlConnection mConnection;
+};
+
+}  // namespace Kxg

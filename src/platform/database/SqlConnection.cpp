@@ -1,0 +1,227 @@
+#include "platform/database/SqlConnection.h"
+
+#include "platform/database/SqlDialect.h"
+
+#include <QSqlDatabase>
+#include <QSqlError>
+
+#include <atomic>
+#include <filesystem>
+#include <system_error>
+#include <utility>
+
+namespace Kxg
+{
+namespace
+{
+
+DatabaseError errorOf(const QSqlError& error)
+{
+    const QString said = error.databaseText().simplified();
+    const bool isBusy =
+        error.nativeErrorCode() == QLatin1String("5");  // SQLite's; PostgreSQL's have five characters
+    return DatabaseError(said.isEmpty() ? error.driverText().simplified() : said, isBusy);
+}
+
+/// Connections are known by name among all threads.
+QString uniqueName()
+{
+    static std::atomic<int> sCount{0};
+    return QStringLiteral("kdd-%1").arg(++sCount);
+}
+
+/// By the name that the engine takes, which is UTF-8 whatever the locale says.
+void provideFile(const QString& path, SqlConnection::IfAbsent ifAbsent)
+{
+    const std::filesystem::path file(path.toStdString());
+    std::error_code error;
+    if (ifAbsent == SqlConnection::IfAbsent::Create)
+        std::filesystem::create_directories(file.parent_path(), error);
+    else if (!std::filesystem::exists(file, error) && !error)
+        error = std::make_error_code(std::errc::no_such_file_or_directory);
+    if (error)
+        throw DatabaseError(QString::fromStdString(error.message()));
+}
+
+}  // namespace
+
+Kdd::Result attempt(const DatabaseAddress& address, const std::function<void()>& work)
+{
+    try {
+        work();
+        return {};
+    } catch (const DatabaseError& error) {
+        return Kdd::Result::failure(QString::fromUtf8(error.what()))
+            .within(QStringLiteral("Database %1").arg(address.shown));
+    }
+}
+
+QVariant textValue(const QByteArray& text)
+{
+    // With its length: the conversion of a whole array would end at the first NUL.
+    QString value = QString::fromUtf8(text.constData(), text.size());
+    value.remove(QChar(0));
+    // A null string would be bound as NULL.
+    return value.isNull() ? QStringLiteral("") : value;
+}
+
+QVariant bytesValue(const QByteArray& bytes)
+{
+    return bytes.isNull() ? QByteArray("") : bytes;
+}
+
+bool SqlRows::next()
+{
+    if (mQuery.next())
+        return true;
+    if (mQuery.lastError().isValid())
+        throw errorOf(mQuery.lastError());
+    return false;
+}
+
+// ---- opening
+
+/// A handle of Qt's and its place in Qt's list, which may be given up only when nobody holds the handle any more.
+struct SqlConnection::Opened
+{
+    Opened(const DatabaseAddress& address, const SqlDialect& dialect)
+        : name(uniqueName())
+        , database(QSqlDatabase::addDatabase(dialect.driver, name))
+    {
+        database.setDatabaseName(address.database);
+        database.setHostName(address.host);
+        database.setPort(address.port);
+        database.setUserName(address.user);
+        database.setPassword(address.password);
+        database.setConnectOptions(dialect.connectOptions);
+    }
+    ~Opened()
+    {
+        database.close();
+        database = QSqlDatabase();
+        QSqlDatabase::removeDatabase(name);
+    }
+    Opened(const Opened&) = delete;
+    Opened& operator=(const Opened&) = delete;
+
+    const QString name;
+    QSqlDatabase database;
+};
+
+SqlConnection::SqlConnection(DatabaseAddress address, IfAbsent ifAbsent)
+    : mAddress(std::move(address))
+    , mIfAbsent(ifAbsent)
+{
+    reopen();
+}
+
+SqlConnection::~SqlConnection() = default;
+
+void SqlConnection::reopen()
+{
+    mStatements.clear();
+    mOpened.reset();
+    const SqlDialect& dialect = SqlDialect::of(mAddress.engine);
+    if (!QSqlDatabase::isDriverAvailable(dialect.driver))
+        throw DatabaseError(QStringLiteral("Qt's database driver %1 is not installed").arg(dialect.driver));
+    if (mAddress.engine == DatabaseAddress::Engine::Sqlite)
+        provideFile(mAddress.database, mIfAbsent);
+    auto opened = std::make_unique<Opened>(mAddress, dialect);
+    if (!opened->database.open())
+        throw errorOf(opened->database.lastError());
+    mOpened = std::move(opened);
+    for (const QString& statement : dialect.afterOpening)
+        execute(statement);
+}
+
+bool SqlConnection::isAlive()
+{
+    return mOpened && QSqlQuery(mOpened->database).exec(QStringLiteral("SELECT 1"));
+}
+
+// ---- transactions
+
+void SqlConnection::beginOnce(Access access)
+{
+    const SqlDialect& dialect = SqlDialect::of(mAddress.engine);
+    for (const QString& statement : access == Access::Read ? dialect.beginReading : dialect.beginWriting)
+        execute(statement);
+}
+
+void SqlConnection::begin(Access access)
+{
+    try {
+        beginOnce(access);
+    } catch (const DatabaseError&) {
+        rollBack();
+        if (isAlive())
+            throw;
+        reopen();
+        beginOnce(access);
+    }
+}
+
+void SqlConnection::rollBack() noexcept
+{
+    // What cannot be rolled back is lost with its connection; the caller reports the first error, not this one.
+    if (mOpened)
+        QSqlQuery(mOpened->database).exec(QStringLiteral("ROLLBACK"));
+}
+
+void SqlConnection::transact(Access access, const std::function<void()>& work)
+{
+    begin(access);
+    try {
+        work();
+        execute(QStringLiteral("COMMIT"));
+    } catch (...) {
+        rollBack();
+        throw;
+    }
+}
+
+// ---- statements
+
+QSqlQuery& SqlConnection::run(const QByteArray& sql, const QVariantList& values)
+{
+    if (!mOpened)
+        throw DatabaseError(QStringLiteral("the connection is lost"));
+    auto found = mStatements.find(sql);
+    if (found == mStatements.end()) {
+        QSqlQuery query(mOpened->database);
+        query.setForwardOnly(true);
+        if (!query.prepare(QString::fromLatin1(sql)))
+            throw errorOf(query.lastError());
+        found = mStatements.emplace(sql, query).first;
+    }
+    QSqlQuery& query = found->second;
+    for (int i = 0; i < values.size(); ++i)
+        query.bindValue(i, values[i]);
+    if (!query.exec())
+        throw errorOf(query.lastError());
+    return query;
+}
+
+SqlRows SqlConnection::ask(const QByteArray& sql, const QVariantList& values)
+{
+    return SqlRows(run(sql, values));
+}
+
+int SqlConnection::change(const QByteArray& sql, const QVariantList& values)
+{
+    QSqlQuery& query = run(sql, values);
+    const int rows = query.numRowsAffected();
+    query.finish();
+    return rows;
+}
+
+void SqlConnection::execute(const QString& sql)
+{
+    if (!mOpened)
+        throw DatabaseError(QStringLiteral("the connection is lost"));
+    QSqlQuery query(mOpened->database);
+    if (!query.exec(sql))
+        throw errorOf(query.lastError());
+}
+
+}  // namespace Kxg

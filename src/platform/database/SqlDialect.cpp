@@ -1,0 +1,65 @@
+#include "platform/database/SqlDialect.h"
+
+namespace Kxg
+{
+namespace
+{
+
+SqlDialect sqlite()
+{
+    SqlDialect dialect;
+    dialect.driver = QStringLiteral("QSQLITE");
+    dialect.connectOptions = QStringLiteral("QSQLITE_BUSY_TIMEOUT=30000");
+    dialect.afterOpening << QStringLiteral("PRAGMA foreign_keys = ON");
+    // Readers and the writer then do not wait for each other.
+    dialect.beforeSchema << QStringLiteral("PRAGMA journal_mode = WAL");
+    dialect.beginReading << QStringLiteral("BEGIN");
+    // A transaction that began by reading cannot wait for another writer: it would have to be repeated.
+    dialect.beginWriting << QStringLiteral("BEGIN IMMEDIATE");
+    dialect.hasSchema = QStringLiteral("SELECT COUNT(*) FROM sqlite_master WHERE name = 'schema_version'");
+    dialect.id = QStringLiteral("INTEGER PRIMARY KEY AUTOINCREMENT");
+    dialect.text = QStringLiteral("TEXT");
+    dialect.bytes = QStringLiteral("BLOB");
+    return dialect;
+}
+
+SqlDialect postgres()
+{
+    SqlDialect dialect;
+    dialect.driver = QStringLiteral("QPSQL");
+    // Either side notices within a minute or so that the other one's machine is gone; the server then gives back
+    // what the connection held.
+    dialect.connectOptions =
+        QStringLiteral("application_name=kdd;connect_timeout=10;"
+                       "keepalives=1;keepalives_idle=30;keepalives_interval=10;keepalives_count=3;"
+                       "options='-c lock_timeout=30s -c tcp_keepalives_idle=30 -c tcp_keepalives_interval=10 "
+                       "-c tcp_keepalives_count=3'");
+    // Notices such as that a table exists already would go to standard error.
+    dialect.afterOpening << QStringLiteral("SET client_min_messages = error");
+    dialect.beginReading << QStringLiteral("BEGIN ISOLATION LEVEL REPEATABLE READ, READ ONLY");
+    // One writer at a time, as with the other engine: else a series could be found empty and removed while another
+    // transaction adds to it, and two that touch the same studies in different order would block each other.
+    dialect.beginWriting
+        << QStringLiteral("BEGIN")
+        << QStringLiteral("SELECT pg_advisory_xact_lock(%1, %2)").arg(kAdvisoryLocks).arg(kWriterLock);
+    // A function that looks a name up, such as to_regclass, would answer from a cache within a transaction that waited
+    // for another one to make the table.
+    dialect.hasSchema =
+        QStringLiteral("SELECT COUNT(*) FROM pg_tables"
+                       " WHERE tablename = 'schema_version' AND schemaname = current_schema()");
+    dialect.id = QStringLiteral("BIGINT GENERATED ALWAYS AS IDENTITY PRIMARY KEY");
+    dialect.text = QStringLiteral("TEXT COLLATE \"C\"");
+    dialect.bytes = QStringLiteral("BYTEA");
+    return dialect;
+}
+
+}  // namespace
+
+const SqlDialect& SqlDialect::of(DatabaseAddress::Engine engine)
+{
+    static const SqlDialect kSqlite = sqlite();
+    static const SqlDialect kPostgres = postgres();
+    return engine == DatabaseAddress::Engine::Sqlite ? kSqlite : kPostgres;
+}
+
+}  // namespace Kxg

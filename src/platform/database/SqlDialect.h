@@ -1,0 +1,37 @@
+#pragma once
+
+#include "platform/database/DatabaseAddress.h"
+
+#include <QString>
+#include <QStringList>
+
+namespace Kxg
+{
+
+/// All that the two engines want said differently; every other statement is the same for both.
+struct SqlDialect
+{
+    QString driver;            ///< of Qt
+    QString connectOptions;    ///< in the driver's form
+    QStringList afterOpening;  ///< statements that every connection begins with
+    QStringList beforeSchema;  ///< statements that a new database needs once, outside a transaction
+
+    /// What a transaction begins with: for reading, one state of the database throughout; for writing, the only writer.
+    QStringList beginReading;
+    QStringList beginWriting;
+
+    QString hasSchema;  ///< a question that gives one number, not 0 when there is a table "schema_version"
+
+    // column types, named {id}, {text} and {bytes} in the schema
+    QString id;     ///< a key that the engine numbers, never using a number twice
+    QString text;   ///< UTF-8, in the order of its bytes
+    QString bytes;  ///< likewise
+
+    static const SqlDialect& of(DatabaseAddress::Engine engine);
+};
+
+/// The numbered locks that we take on a PostgreSQL server, beside a number: a study's id, or this one for writing.
+constexpr int kAdvisoryLocks = 0x4b444442;
+constexpr int kWriterLock = -1;
+
+}  // namespace Kxg

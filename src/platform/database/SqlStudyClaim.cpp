@@ -1,0 +1,223 @@
+#include "platform/database/SqlCatalogue.h"
+#include "platform/database/StudyContent.h"
+#include "platform/database/StudyLock.h"
+
+#include <QElapsedTimer>
+#include <QThread>
+
+#include <utility>
+
+namespace Kxg
+{
+namespace
+{
+
+constexpr int kPageOfQueue = 64;      // [requests]
+constexpr unsigned long kPause = 20;  // [ms]
+
+QVector<qint64> requestsOf(SqlConnection& connection, qint64 studyId)
+{
+    QVector<qint64> requests;
+    SqlRows rows = connection.ask("SELECT id FROM build_request WHERE study_id = ? ORDER BY id", {studyId});
+    while (rows.next())
+        requests.push_back(rows.number(0));
+    return requests;
+}
+
+void deleteRequests(SqlConnection& connection, const QVector<qint64>& requests)
+{
+    for (const qint64 request : requests)
+        connection.change("DELETE FROM build_request WHERE id = ?", {request});
+}
+
+/// A study as it is once it is locked.
+struct LockedStudy
+{
+    bool isThere = false;
+    QByteArray uid;
+    QVector<qint64> requests;
+};
+
+LockedStudy readLocked(SqlConnection& connection, qint64 studyId)
+{
+    LockedStudy study;
+    // A transaction begun after the study was locked sees all that its former holder and others have done.
+    connection.transact(SqlConnection::Access::Read, [&] {
+        study.requests = requestsOf(connection, studyId);
+        SqlRows rows = connection.ask("SELECT uid FROM study WHERE id = ?", {studyId});
+        study.isThere = rows.next();
+        if (study.isThere)
+            study.uid = rows.text(0);
+    });
+    return study;
+}
+
+/// A study that is locked, and the requests that were there after it was: whatever left them is seen by its builder.
+class SqlStudyClaim : public StudyClaim
+{
+public:
+    SqlStudyClaim(SqlConnection& connection, std::unique_ptr<StudyLock> lock, qint64 studyId,
+                  LockedStudy study)
+        : mConnection(connection)
+        , mLock(std::move(lock))
+        , mStudyId(studyId)
+        , mStudy(std::move(study))
+    {
+    }
+
+    int studyId() const override { return static_cast<int>(mStudyId); }
+    const QByteArray& studyInstanceUID() const override { return mStudy.uid; }
+
+    Kdd::Result finish() override
+    {
+        return attempt(mConnection.address(), [this] {
+            mLock->confirm();
+            mConnection.transact(SqlConnection::Access::Write,
+                                 [this] { deleteRequests(mConnection, mStudy.requests); });
+        });
+    }
+
+private:
+    SqlConnection& mConnection;
+    const std::unique_ptr<StudyLock> mLock;
+    const qint64 mStudyId;
+    const LockedStudy mStudy;
+};
+
+struct Request
+{
+    qint64 id = 0;
+    qint64 studyId = 0;
+};
+
+/// The requests after `last`, in the order in which they came.
+std::vector<Request> pageOfQueue(SqlConnection& connection, qint64 last)
+{
+    std::vector<Request> page;
+    connection.transact(SqlConnection::Access::Read, [&] {
+        SqlRows rows = connection.ask(
+            "SELECT id, study_id FROM build_request WHERE id > ? ORDER BY id LIMIT ?", {last, kPageOfQueue});
+        while (rows.next())
+            page.push_back({rows.number(0), rows.number(1)});
+    });
+    return page;
+}
+
+/// Goes through the queue and locks the first study that is free.
+class QueueWalk
+{
+public:
+    explicit QueueWalk(SqlConnection& connection)
+        : mConnection(connection)
+    {
+    }
+
+    std::unique_ptr<StudyClaim> claimFirst(const QSet<int>& except)
+    {
+        for (const int studyId : except)
+            mPassed.insert(studyId);
+        std::unique_ptr<StudyClaim> claim;
+        qint64 last = 0;
+        for (auto page = pageOfQueue(mConnection, last); !claim && !page.empty();
+             page = pageOfQueue(mConnection, last)) {
+            last = page.back().id;
+            claim = claimOneOf(page);
+        }
+        return claim;
+    }
+
+private:
+    std::unique_ptr<StudyClaim> claimOneOf(const std::vector<Request>& page)
+    {
+        std::unique_ptr<StudyClaim> claim;
+        for (auto request = page.begin(); !claim && request != page.end(); ++request) {
+            if (mPassed.contains(request->studyId))
+                continue;
+            mPassed.insert(request->studyId);
+            claim = tryClaim(request->studyId);
+        }
+        return claim;
+    }
+
+    std::unique_ptr<StudyClaim> tryClaim(qint64 studyId)
+    {
+        if (!mLock)
+            mLock = StudyLock::make(mConnection.address());
+        if (!mLock->tryLock(studyId))
+            return nullptr;
+        LockedStudy study = readLocked(mConnection, studyId);
+        // Its former holder may have done the work since the queue was read.
+        if (study.requests.isEmpty()) {
+            mLock->unlock();
+            return nullptr;
+        }
+        return std::make_unique<SqlStudyClaim>(mConnection, std::move(mLock), studyId, std::move(study));
+    }
+
+    SqlConnection& mConnection;
+    std::unique_ptr<StudyLock>
+        mLock;             // made when there is something to lock: it may be a connection to a server
+    QSet<qint64> mPassed;  // studies
+};
+
+/// Null when another holds the study.
+std::unique_ptr<StudyClaim> tryClaim(SqlConnection& connection, std::unique_ptr<StudyLock>& lock,
+                                     const QByteArray& studyUID)
+{
+    qint64 studyId = 0;
+    connection.transact(SqlConnection::Access::Read, [&] { studyId = obtainStudyId(connection, studyUID); });
+    if (!lock->tryLock(studyId))
+        return nullptr;
+    LockedStudy study = readLocked(connection, studyId);
+    // It may have been removed, and registered again under another id, before it was locked.
+    if (!study.isThere) {
+        lock->unlock();
+        return nullptr;
+    }
+    return std::make_unique<SqlStudyClaim>(connection, std::move(lock), studyId, std::move(study));
+}
+
+}  // namespace
+
+Kdd::Result SqlCatalogue::requestBuild(const QVector<QByteArray>& studyUIDs)
+{
+    return transact(Access::Write, [&] {
+        for (const QByteArray& uid : studyUIDs)
+            leaveRequest(mConnection, obtainStudyId(mConnection, uid));
+    });
+}
+
+Kdd::Result SqlCatalogue::countWaiting(int& studies)
+{
+    return transact(Access::Read, [&] {
+        SqlRows rows = mConnection.ask("SELECT COUNT(DISTINCT study_id) FROM build_request");
+        if (rows.next())
+            studies = static_cast<int>(rows.number(0));
+    });
+}
+
+Kdd::Result SqlCatalogue::claimNext(const QSet<int>& except, std::unique_ptr<StudyClaim>& claim)
+{
+    claim.reset();
+    return attempt(mConnection.address(), [&] { claim = QueueWalk(mConnection).claimFirst(except); });
+}
+
+Kdd::Result SqlCatalogue::claim(const QByteArray& studyUID, int patienceMs,
+                                std::unique_ptr<StudyClaim>& claim)
+{
+    claim.reset();
+    return attempt(mConnection.address(), [&] {
+        QElapsedTimer waited;
+        waited.start();
+        std::unique_ptr<StudyLock> lock = StudyLock::make(mConnection.address());
+        while (!(claim = tryClaim(mConnection, lock, studyUID)) && waited.elapsed() < patienceMs)
+            QThread::msleep(kPause);
+    });
+}
+
+Kdd::Result SqlCatalogue::finishRequests(const QVector<qint64>& requests)
+{
+    return transact(Access::Write, [&] { deleteRequests(mConnection, requests); });
+}
+
+}  // namespace Kxg

@@ -1,0 +1,58 @@
+#include "platform/database/StorageManager.h"
+
+#include "platform/database/Kxg.h"
+#include "platform/database/QuestionConnection.h"
+#include "platform/database/SqlConnection.h"
+
+#include <QMap>
+#include <QMutex>
+#include <QMutexLocker>
+
+namespace Kxg
+{
+namespace
+{
+
+const char kSection[] = "Storage";
+const char kVolumeKey[] = "Volume";
+
+QMutex sMutex;
+QVector<QByteArray> sVolumes;  // guarded by sMutex
+
+/// 0 for the key of something else.
+int volumeNumber(const QByteArray& key)
+{
+    return key.startsWith(kVolumeKey) ? key.mid(static_cast<int>(sizeof kVolumeKey) - 1).toInt() : 0;
+}
+
+}  // namespace
+
+QByteArray StorageManager::getMetaFolder()
+{
+    return GetGlobalConfig(kSection, "MetaFolder", QByteArray());
+}
+
+Kdd::Result StorageManager::retrieveStorageVolumes()
+{
+    QMap<int, QByteArray> volumes;
+    Kdd::Result result = askDatabase([&](SqlConnection& connection) {
+        SqlRows rows =
+            connection.ask("SELECT name, value FROM config WHERE section = ?", {textValue(kSection)});
+        while (rows.next())
+            if (const int number = volumeNumber(rows.text(0)); number > 0)
+                volumes.insert(number, rows.bytes(1));
+    });
+    if (result.good()) {
+        const QMutexLocker locker(&sMutex);
+        sVolumes = volumes.values().toVector();
+    }
+    return result;
+}
+
+QVector<QByteArray> StorageManager::storageVolumes()
+{
+    const QMutexLocker locker(&sMutex);
+    return sVolumes;
+}
+
+}  // namespace Kxg

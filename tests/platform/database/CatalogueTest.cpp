@@ -1,0 +1,177 @@
+#include "DatabaseFixture.h"
+#include "platform/database/StorageManager.h"
+
+#include <set>
+
+using namespace Kxg;
+
+namespace
+{
+
+class CatalogueTest : public DatabaseTest
+{
+protected:
+    /// What the tag file side is told of a study.
+    std::string told(const QByteArray& studyUID)
+    {
+        QByteArray text;
+        std::shared_ptr<DicomDirectoryEntry> study;
+        EXPECT_EQ(GetStudy(studyUID, 1000, study).text().toStdString(), "");
+        if (!study)
+            return "none";
+        for (const auto& series : study->entries) {
+            text += series.seriesInstanceUID + ' ' + series.modality + ':';
+            for (const auto& file : series.entries)
+                text += ' ' + file.name;
+            text += '\n';
+        }
+        QMap<QByteArray, std::shared_ptr<SeriesInfo>> images;
+        EXPECT_EQ(GetSeries(studyUID, images).text().toStdString(), "");
+        for (const auto& series : qAsConst(images))
+            for (const ImageFile& image : series->images)
+                text += series->seriesInstanceUID + ' ' + image.sopInstanceUID + ' ' + image.path + '\n';
+        return text.toStdString();
+    }
+
+    std::set<std::string> known(const QByteArray& path)
+    {
+        QHash<QByteArray, FileStamp> stamps;
+        EXPECT_EQ(catalogue().knownFiles(path, stamps).text().toStdString(), "");
+        std::set<std::string> paths;
+        for (const QByteArray& found : stamps.keys())
+            paths.insert(found.toStdString());
+        return paths;
+    }
+};
+
+INSTANTIATE_TEST_SUITE_P(Engines, CatalogueTest, testing::Values(Engine::Sqlite, Engine::Postgres),
+                         engineName);
+
+using Paths = std::vector<std::string>;
+using PathSet = std::set<std::string>;
+
+TEST_P(CatalogueTest, AFileThatMovesTouchesBothStudiesAndAnEmptyOneGoes)
+{
+    add({dicom("/d/a", "1.1", "1.1.1"), dicom("/d/b", "1.1", "1.1.1")});
+    EXPECT_EQ(add({dicom("/d/a", "1.2", "1.2.1")}).keys(), (QList<QByteArray>{"1.1", "1.2"}));
+    EXPECT_EQ(studies(), "1.1   1/1/0*\n1.2   1/1/0*\n");
+    EXPECT_EQ(add(FileRecords{{}, {}, {{"/d/b", {}}}}).keys(), QList<QByteArray>());
+    EXPECT_EQ(studies(), "1.2   1/1/0*\n");
+    int waiting = 0;
+    ASSERT_TRUE(catalogue().countWaiting(waiting).good());
+    EXPECT_EQ(waiting, 1);
+}
+
+TEST_P(CatalogueTest, ListsAreInTheOrderOfBytesWhateverTheOrderOfRegistering)
+{
+    std::vector<DicomFileRecord> files = {
+        dicom("/d/B", "1", "1.10", "a"),        dicom("/d/a'\\b", "1", "1.10", "b"),
+        dicom("/d/\xC3\xA9", "1", "1.10", "c"), dicom("/d/\xFF\x01", "1", "1.10", "d"),
+        dicom("/d/0", "1", "1.9", "e"),         dicom("/d/?", "1", "1.10", "f")};
+    const std::vector<VolumeFileRecord> volumes = {{"/w/\xFEv_part002", {}, "1", "1.9"},
+                                                   {"/x/\xFEv", {}, "1", "1.9"}};
+    add(FileRecords{{}, {volumes[1]}, {}});
+    add(FileRecords{{files.rbegin(), files.rend()}, {volumes[0]}, {}});
+    EXPECT_EQ(
+        told("1"),
+        "1.10 :\n1.9 : \xFEv \xFEv_part002\n"
+        "1.10 f /d/?\n1.10 a /d/B\n1.10 b /d/a'\\b\n1.10 c /d/\xC3\xA9\n1.10 d /d/\xFF\x01\n1.9 e /d/0\n");
+    Paths dicomPaths, volumePaths, series;
+    ASSERT_TRUE(GetAllFilesOfStudy("user", 1, dicomPaths, volumePaths, series).good());
+    EXPECT_EQ(dicomPaths, (Paths{"/d/0", "/d/?", "/d/B", "/d/a'\\b", "/d/\xC3\xA9", "/d/\xFF\x01"}));
+    EXPECT_EQ(volumePaths, (Paths{"/w/\xFEv_part002", "/x/\xFEv"}));
+    EXPECT_EQ(series, Paths{"1.9"});
+    EXPECT_TRUE(GetAllFilesOfStudy("user", 2, dicomPaths, volumePaths, series).bad());
+    EXPECT_EQ(told("2"), "none");
+}
+
+TEST_P(CatalogueTest, KnowsWhatLiesBelowAFolderAndNothingBesideIt)
+{
+    add(FileRecords{{dicom("/d/a", "1", "1.1"), dicom("/d.x", "1", "1.1"), dicom("/d0", "1", "1.1")},
+                    {},
+                    {{"/d/b/\xFF", {}}}});
+    const PathSet below = {"/d/a", "/d/b/\xFF"};
+    EXPECT_EQ(known("/d"), below);
+    EXPECT_EQ(known("/d//"), below);
+    EXPECT_EQ(known("/d/a"), PathSet{"/d/a"});
+    EXPECT_EQ(known("/").size(), 4U);
+    EXPECT_EQ(known("/e"), PathSet());
+}
+
+TEST_P(CatalogueTest, TheFirstDicomFileThatIsKeptDescribesItsStudy)
+{
+    Requests none;
+    const FileRecords bad = {
+        {dicom("/d/a", "1", "1.1"), dicom("/d/bad", QByteArray(300, '1'), "1.1")}, {}, {}};
+    EXPECT_NE(catalogue().registerFiles(bad, none).text().indexOf(QLatin1String("/d/bad")), -1);
+    EXPECT_EQ(studies(), "");
+    add(FileRecords{{}, {{"/d/0.volume", {}, "1", "1.1"}}, {}});
+    DicomFileRecord first = dicom("/d/a", "1", "1.1"), later = dicom("/d/b", "1", "1.2");
+    first.patientName = QByteArray("Zo\xEB\0^\xE5\xB1\xB1", 8);  // neither UTF-8 nor free of NUL
+    first.modality = "MR";
+    later.patientName = "Other";
+    later.modality = "CT";
+    add({later, first});
+    EXPECT_EQ(studies(), "1 Zo\xEF\xBF\xBD^\xE5\xB1\xB1 CT MR 2/2/1*\n");
+    EXPECT_EQ(told("1").substr(0, 28), "1.1 MR: 0.volume\n1.2 CT:\n1.1");
+}
+
+TEST_P(CatalogueTest, KeepsEveryFileOfALargeSetOnceWithItsLastStamp)
+{
+    std::vector<DicomFileRecord> files(257, dicom("", "1", "1.1"));
+    for (size_t i = 0; i < files.size(); ++i)
+        files[i].path = "/d/" + QByteArray::number(static_cast<int>(i % 254));
+    add(files);
+    for (DicomFileRecord& file : files)
+        file.stamp = {5, 7};
+    add(files);
+    QHash<QByteArray, FileStamp> stamps;
+    ASSERT_TRUE(catalogue().knownFiles("/", stamps).good());
+    EXPECT_EQ(stamps.size(), 254);
+    EXPECT_EQ(stamps.values().count({5, 7}), 254);
+    EXPECT_EQ(studies(), "1   1/254/0*\n");
+}
+
+TEST_P(CatalogueTest, WhatIsRemovedIsForgottenWithAllThatBecomesEmpty)
+{
+    const std::vector<DicomFileRecord> files = {
+        dicom("/d/a", "1", "1.1", "x"), dicom("/d/b", "1", "1.2", "y"), dicom("/d/c", "1", "1.2", "z")};
+    add(FileRecords{files, {{"/d/v", {}, "1", "1.1"}}, {}});
+    add({dicom("/e/a", "2", "2.1", "x")});
+    EXPECT_TRUE(catalogue().removeImage("1", "x").good());
+    EXPECT_EQ(known("/"), (PathSet{"/d/b", "/d/c", "/d/v", "/e/a"}));
+    EXPECT_TRUE(catalogue().removeSeries("1", "1.2").good());
+    EXPECT_EQ(studies(), "1   1/0/1*\n2   1/1/0*\n");
+    EXPECT_TRUE(catalogue().removeStudy("1").good());
+    EXPECT_EQ(studies(), "2   1/1/0*\n");
+}
+
+TEST_P(CatalogueTest, FindsStudiesByTheBeginningOfTheirUID)
+{
+    add({dicom("/d/a", "1.2", "1"), dicom("/d/b", "1.25", "1"), dicom("/d/c", "1.3", "1"),
+         dicom("/d/d", "1_2", "1")});
+    QVector<QByteArray> found;
+    ASSERT_TRUE(catalogue().findStudies("1.2", 10, found).good());
+    EXPECT_EQ(found, (QVector<QByteArray>{"1.2", "1.25"}));
+    ASSERT_TRUE(catalogue().findStudies("1", 3, found).good());
+    EXPECT_EQ(found, (QVector<QByteArray>{"1.2", "1.25", "1.3"}));
+}
+
+TEST_P(CatalogueTest, ConfigurationIsReadBack)
+{
+    catalogue();
+    EXPECT_EQ(StorageManager::getMetaFolder(), "");
+    const char* const values[][2] = {{"MetaFolder", "/meta/\xFF"},
+                                     {"Volume10", "/j"},
+                                     {"Volume2", "/b"},
+                                     {"Volume2", "/c"},
+                                     {"VolumeX", "/x"}};
+    for (const auto& value : values)
+        EXPECT_TRUE(catalogue().setConfig("Storage", value[0], value[1]).good());
+    EXPECT_EQ(StorageManager::getMetaFolder(), "/meta/\xFF");
+    EXPECT_TRUE(StorageManager::retrieveStorageVolumes().good());
+    EXPECT_EQ(StorageManager::storageVolumes(), (QVector<QByteArray>{"/c", "/j"}));
+    EXPECT_EQ(GetGlobalConfig("Other", "MetaFolder", "fallback"), "fallback");
+}
+
+}  // namespace

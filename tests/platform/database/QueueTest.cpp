@@ -1,0 +1,155 @@
+#include "DatabaseFixture.h"
+
+#include <sys/prctl.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <atomic>
+#include <csignal>
+#include <functional>
+#include <thread>
+
+using namespace Kxg;
+
+namespace
+{
+
+class QueueTest : public DatabaseTest
+{
+protected:
+    /// Registers studies "1" to `count`, each with a file.
+    void addStudies(int count)
+    {
+        for (int i = 1; i <= count; ++i) {
+            const QByteArray uid = QByteArray::number(i);
+            add({dicom(("/d/" + uid).constData(), uid.constData(), "1")});
+        }
+    }
+
+    bool canClaim(const QByteArray& studyUID, int patience = 0)
+    {
+        std::unique_ptr<StudyClaim> claim;
+        EXPECT_EQ(catalogue().claim(studyUID, patience, claim).text().toStdString(), "");
+        return claim != nullptr;
+    }
+};
+
+INSTANTIATE_TEST_SUITE_P(Engines, QueueTest, testing::Values(Engine::Sqlite, Engine::Postgres), engineName);
+
+void runInThreads(int count, const std::function<void()>& life)
+{
+    std::vector<std::thread> threads;
+    for (int i = 0; i < count; ++i)
+        threads.emplace_back(life);
+    for (std::thread& thread : threads)
+        thread.join();
+}
+
+/// Runs `life` in another process and waits until that stops itself.
+pid_t stoppedProcess(const std::function<void()>& life)
+{
+    const pid_t pid = ::fork();
+    if (pid == 0) {
+        ::prctl(PR_SET_PDEATHSIG, SIGKILL);
+        life();
+        ::_exit(1);
+    }
+    int status = 0;
+    EXPECT_EQ(::waitpid(pid, &status, WUNTRACED), pid);
+    EXPECT_TRUE(WIFSTOPPED(status));
+    return pid;
+}
+
+TEST_P(QueueTest, TheLongestWaitingFreeStudyIsNext)
+{
+    addStudies(1);
+    for (int i = 0; i < 70; ++i)
+        ASSERT_TRUE(catalogue().requestBuild({"1"}).good());
+    addStudies(3);
+    const auto first = claimNext();
+    const auto third = claimNext({2});
+    ASSERT_TRUE(first && third);
+    EXPECT_EQ(first->studyInstanceUID(), "1");
+    EXPECT_EQ(third->studyInstanceUID(), "3");
+    EXPECT_FALSE(claimNext({2}));
+    int waiting = 0;
+    ASSERT_TRUE(catalogue().countWaiting(waiting).good());
+    EXPECT_EQ(waiting, 3);
+}
+
+TEST_P(QueueTest, RequestsThatComeWhileAStudyIsBuiltMakeItWaitAgain)
+{
+    addStudies(1);
+    for (const char* expected : {"1   1/2/0*\n", "1   1/2/0\n"}) {
+        const auto claim = claimNext();
+        ASSERT_TRUE(claim);
+        if (studies() == "1   1/1/0*\n")
+            add({dicom("/d/more", "1", "1")});
+        EXPECT_TRUE(claim->finish().good());
+        EXPECT_EQ(studies(), expected);
+    }
+    EXPECT_FALSE(claimNext());
+}
+
+TEST_P(QueueTest, AStudyIsClaimedByNameUnlessItIsHeldOrUnknown)
+{
+    addStudies(1);
+    {
+        const auto held = claimNext();
+        EXPECT_FALSE(canClaim("1"));
+        // Its holder is not in his own way.
+        EXPECT_TRUE(catalogue().removeStudy("1").good());
+        addStudies(1);
+        EXPECT_TRUE(canClaim("1"));
+    }
+    std::unique_ptr<StudyClaim> claim;
+    for (const Kdd::Result& result :
+         {catalogue().claim("1.9", 0, claim), catalogue().requestBuild({"1", "1.9"})})
+        EXPECT_TRUE(result.text().endsWith(QLatin1String(": there is no study 1.9")))
+            << qPrintable(result.text());
+}
+
+TEST_P(QueueTest, ThreadsNeverHoldOneStudyTogetherAndLeaveNone)
+{
+    constexpr int kStudies = 40;
+    addStudies(kStudies);
+    std::atomic<int> holders[kStudies + 1] = {};
+    std::atomic<int> built{0};
+    const auto life = [&] {
+        const auto own = open();
+        for (std::unique_ptr<StudyClaim> claim; own->claimNext({}, claim).good() && claim; claim.reset()) {
+            EXPECT_EQ(++holders[claim->studyId()], 1);
+            built += claim->finish().good() ? 1 : 0;
+            --holders[claim->studyId()];
+        }
+    };
+    runInThreads(4, life);
+    EXPECT_EQ(built, kStudies);
+}
+
+TEST_P(QueueTest, AKilledProcessGivesItsStudyBack)
+{
+    addStudies(1);
+    const pid_t holder = stoppedProcess([this] {
+        const auto own = open();
+        std::unique_ptr<StudyClaim> claim;
+        if (own->claimNext({}, claim).good() && claim)
+            ::raise(SIGSTOP);
+    });
+    EXPECT_FALSE(canClaim("1"));
+    EXPECT_FALSE(claimNext());
+    ::kill(holder, SIGKILL);
+    ::waitpid(holder, nullptr, 0);
+    EXPECT_TRUE(canClaim("1", 20000));
+    EXPECT_EQ(studies(), "1   1/1/0*\n");
+}
+
+TEST_P(QueueTest, AllWhoMakeTheDatabaseAtOnceSucceed)
+{
+    std::atomic<int> opened{0};
+    runInThreads(8, [&] { opened += open() ? 1 : 0; });
+    EXPECT_EQ(opened, 8);
+    addStudies(1);
+}
+
+}  // namespace
