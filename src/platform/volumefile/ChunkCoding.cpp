@@ -1,0 +1,87 @@
+#include "platform/volumefile/ChunkCoding.h"
+
+#include <libdeflate.h>
+
+#include <memory>
+
+namespace Kdd::VolumeFile
+{
+namespace
+{
+
+// Higher levels take several times as long and save a few percent of a shuffled image.
+constexpr int kLevel = 1;
+// One code of two bits at least, one for the length and one for the distance, yields 258 bytes at most.
+constexpr qint64 kMaxExpansion = 1032;
+
+struct Free
+{
+    void operator()(libdeflate_compressor* compressor) const { libdeflate_free_compressor(compressor); }
+    void operator()(libdeflate_decompressor* decompressor) const
+    {
+        libdeflate_free_decompressor(decompressor);
+    }
+};
+
+}  // namespace
+
+QByteArray shuffled(const QByteArray& elements, int elementSize)
+{
+    const int count = elements.size() / elementSize;
+    QByteArray planes(elements.size(), Qt::Uninitialized);
+    char* to = planes.data();
+    for (int byte = 0; byte < elementSize; ++byte) {
+        const char* from = elements.constData() + byte;
+        for (int i = 0; i < count; ++i, from += elementSize)
+            *to++ = *from;
+    }
+    return planes;
+}
+
+QByteArray unshuffled(const QByteArray& planes, int elementSize)
+{
+    const int count = planes.size() / elementSize;
+    QByteArray elements(planes.size(), Qt::Uninitialized);
+    const char* from = planes.constData();
+    for (int byte = 0; byte < elementSize; ++byte) {
+        char* to = elements.data() + byte;
+        for (int i = 0; i < count; ++i, to += elementSize)
+            *to = *from++;
+    }
+    return elements;
+}
+
+QByteArray deflated(const QByteArray& content)
+{
+    const std::unique_ptr<libdeflate_compressor, Free> compressor(libdeflate_alloc_compressor(kLevel));
+    if (!compressor)
+        return {};
+    const auto size = static_cast<std::size_t>(content.size());
+    const std::size_t bound = libdeflate_zlib_compress_bound(compressor.get(), size);
+    QByteArray stream(static_cast<int>(bound), Qt::Uninitialized);
+    const std::size_t written =
+        libdeflate_zlib_compress(compressor.get(), content.constData(), size, stream.data(), bound);
+    if (written == 0)
+        return {};
+    stream.resize(static_cast<int>(written));
+    return stream;
+}
+
+bool canInflate(qint64 streamSize, qint64 contentSize)
+{
+    return contentSize / kMaxExpansion <= streamSize;
+}
+
+QByteArray inflated(const QByteArray& stream, int size)
+{
+    const std::unique_ptr<libdeflate_decompressor, Free> decompressor(libdeflate_alloc_decompressor());
+    if (!decompressor)
+        return {};
+    QByteArray content(size, Qt::Uninitialized);
+    const libdeflate_result result = libdeflate_zlib_decompress(
+        decompressor.get(), stream.constData(), static_cast<std::size_t>(stream.size()), content.data(),
+        static_cast<std::size_t>(size), nullptr);
+    return result == LIBDEFLATE_SUCCESS ? content : QByteArray();
+}
+
+}  // namespace Kdd::VolumeFile

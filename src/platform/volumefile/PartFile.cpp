@@ -1,0 +1,120 @@
+#include "platform/volumefile/PartFile.h"
+
+#include <QRandomGenerator>
+
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstdio>
+#include <cstring>
+#include <system_error>
+#include <utility>
+
+namespace Kdd::VolumeFile
+{
+namespace
+{
+
+Result systemFailure(const char* what, int error)
+{
+    const QString reason = QString::fromLocal8Bit(std::system_category().message(error).c_str());
+    return Result::failure(reason).within(QString::fromLatin1(what));
+}
+
+}  // namespace
+
+PartFile::~PartFile()
+{
+    if (mDescriptor >= 0)
+        ::close(mDescriptor);
+    if (!mPath.isEmpty())
+        ::unlink(mPath.constData());
+}
+
+Result PartFile::create(const QByteArray& target)
+{
+    const QByteArray passing = QByteArray::number(QRandomGenerator::global()->generate64(), 16);
+    const QByteArray path = target + '.' + passing + ".part";
+    mDescriptor = ::open(path.constData(), O_RDWR | O_CREAT | O_EXCL | O_CLOEXEC, 0666);
+    if (mDescriptor < 0)
+        return systemFailure("cannot be made", errno);
+    mTarget = target;
+    mPath = path;
+    return {};
+}
+
+void PartFile::fail(int error)
+{
+    if (mError == 0)
+        mError = error;
+}
+
+bool PartFile::write(qint64 at, const void* bytes, std::size_t size)
+{
+    const auto* from = static_cast<const char*>(bytes);
+    mSize = std::max(mSize, at + static_cast<qint64>(size));
+    while (size > 0 && mError == 0) {
+        const ssize_t written = ::pwrite(mDescriptor, from, size, at);
+        if (written < 0 && errno == EINTR)
+            continue;
+        if (written <= 0) {
+            fail(written < 0 ? errno : EIO);
+            break;
+        }
+        from += written;
+        at += written;
+        size -= static_cast<std::size_t>(written);
+    }
+    return true;
+}
+
+bool PartFile::truncate(qint64 size)
+{
+    mSize = size;
+    if (mError == 0 && ::ftruncate(mDescriptor, size) != 0)
+        fail(errno);
+    return true;
+}
+
+bool PartFile::read(qint64 at, void* bytes, std::size_t size)
+{
+    auto* to = static_cast<char*>(bytes);
+    while (size > 0 && mError == 0) {
+        const ssize_t got = ::pread(mDescriptor, to, size, at);
+        if (got < 0 && errno == EINTR)
+            continue;
+        if (got < 0)
+            fail(errno);
+        if (got <= 0)
+            break;
+        to += got;
+        at += got;
+        size -= static_cast<std::size_t>(got);
+    }
+    std::memset(to, 0, size);
+    return true;
+}
+
+Result PartFile::state() const
+{
+    return mError == 0 ? Result() : systemFailure("cannot be written", mError);
+}
+
+Result PartFile::publish()
+{
+    // Not flushed to disk: a volume can be made again from its images, and one that a power loss has torn is known by
+    // its checksums.
+    // Network file systems keep errors back until then.
+    if (::close(std::exchange(mDescriptor, -1)) != 0)
+        fail(errno);
+    if (mError != 0)
+        return state();
+    if (std::rename(mPath.constData(), mTarget.constData()) != 0)
+        return systemFailure("cannot be named", errno);
+    mPath.clear();
+    return {};
+}
+
+}  // namespace Kdd::VolumeFile

@@ -1,0 +1,49 @@
+#include "platform/volumefile/ReadStore.h"
+
+#include <cstring>
+#include <system_error>
+#include <utility>
+
+namespace Kdd::VolumeFile
+{
+
+bool ReadStore::write(qint64 /*at*/, const void* /*bytes*/, std::size_t /*size*/)
+{
+    return false;
+}
+
+bool ReadStore::truncate(qint64 /*size*/)
+{
+    return false;
+}
+
+Result FileToRead::open(const QByteArray& path)
+{
+    const int error = mFile.open(path.constData());
+    if (error == 0)
+        return {};
+    return Result::failure(QString::fromLocal8Bit(std::system_category().message(error).c_str()));
+}
+
+bool FileToRead::read(qint64 at, void* bytes, std::size_t size)
+{
+    if (at < 0 || at > mFile.size() || size > static_cast<std::size_t>(mFile.size() - at))
+        return false;
+    const auto count = static_cast<qint64>(size);
+    return mFile.readAt(at, bytes, count) == count;
+}
+
+BytesToRead::BytesToRead(QByteArray bytes)
+    : mBytes(std::move(bytes))
+{
+}
+
+bool BytesToRead::read(qint64 at, void* bytes, std::size_t size)
+{
+    if (at < 0 || at > mBytes.size() || size > static_cast<std::size_t>(mBytes.size() - at))
+        return false;
+    std::memcpy(bytes, mBytes.constData() + at, size);
+    return true;
+}
+
+}  // namespace Kdd::VolumeFile

@@ -1,0 +1,296 @@
+#include "platform/volumefile/ChunkCoding.h"
+#include "platform/volumefile/OrlanMesh.h"
+#include "platform/volumefile/SOPInstanceUtility.h"
+#include "platform/volumefile/VolumeFileBuilder.h"
+
+#include <gtest/gtest.h>
+#include <hdf5.h>
+
+#include <random>
+
+using namespace Kdd;
+
+// The library itself loses some memory with every damaged object header. What we leave open is counted below.
+extern "C" const char* __lsan_default_suppressions()
+{
+    return "leak:libhdf5";
+}
+
+namespace
+{
+
+constexpr char kLevel0[] = "Lattices/Level0";
+constexpr char kHistogram[] = "DataSections/Histogram";
+
+/// Reads all there is. What is accepted has to be the truth.
+Result readAll(const QByteArray& bytes)
+{
+    Result result;
+    const auto mesh = OrlanMesh::read(bytes, "damaged.vol", result);
+    const Lattice* lattice = mesh ? mesh->findLattice("Level0", 3) : nullptr;
+    QVector<quint64> counts;
+    if (lattice != nullptr)
+        result = mesh->readDataSection("Histogram", counts);
+    for (int i = 0; result.good() && i < qMin(lattice->dims.at(2), 5); ++i) {
+        TypedData2D pixels;
+        result = mesh->readSlice(*lattice, i, pixels);
+        EXPECT_TRUE(result.bad() || pixels.pixels == sliceOf(*lattice, i).pixels);
+    }
+    EXPECT_TRUE(result.good() || result.text().startsWith(QLatin1String("Volume file damaged.vol: ")));
+    return result;
+}
+
+QByteArray smallFile()
+{
+    ParamBundle parameters;
+    parameters.insert("BoundingBox", Parameter::ofReals({0, 1, 0, 1, 0, 1}));
+    parameters.insertBundle("SOPInstanceUIDs", SOPInstanceUtility::bundleOf({"1.2.1", "1.2.2", "1.2.3"}));
+    const VolumeFileBuilder file;
+    file.write(aLattice(), parameters);
+    return file.bytes();
+}
+
+TEST(DamagedVolumeFile, IsRefusedWhereverItEnds)
+{
+    const QByteArray whole = smallFile();
+    ASSERT_TRUE(readAll(whole).good());
+    for (int size = 0; size < whole.size(); size += 7)
+        EXPECT_TRUE(readAll(whole.left(size)).bad()) << size;
+}
+
+TEST(DamagedVolumeFile, IsRefusedOrGivesTheTruePixels)
+{
+    const QByteArray whole = smallFile();
+    std::minstd_rand random(1);
+    for (int i = 0; i < 4'000; ++i) {
+        QByteArray damaged = whole;
+        for (int flip = 0; flip <= i % 3; ++flip) {
+            const int at = static_cast<int>(random() % static_cast<unsigned>(damaged.size()));
+            damaged[at] = static_cast<char>(damaged.at(at) ^ (1 << random() % 8));
+        }
+        readAll(damaged);
+    }
+    EXPECT_EQ(H5Fget_obj_count(static_cast<hid_t>(H5F_OBJ_ALL), H5F_OBJ_ALL), 0);
+}
+
+/// A sound file in which one thing is replaced through the library itself, checksums and all.
+struct Hostile
+{
+    const char* name;
+    const char* reason;
+    void (*change)(hid_t file);
+};
+
+void putDataset(hid_t file, const char* name, hid_t type, const std::vector<hsize_t>& dims, hid_t properties)
+{
+    if (H5Lexists(file, name, H5P_DEFAULT) > 0)
+        H5Ldelete(file, name, H5P_DEFAULT);
+    const hid_t space = H5Screate_simple(static_cast<int>(dims.size()), dims.data(), nullptr);
+    H5Dclose(H5Dcreate2(file, name, type, space, H5P_DEFAULT, properties, H5P_DEFAULT));
+    H5Sclose(space);
+    H5Pclose(properties);
+}
+
+hid_t chunked(const std::vector<hsize_t>& chunk)
+{
+    const hid_t properties = H5Pcreate(H5P_DATASET_CREATE);
+    H5Pset_chunk(properties, static_cast<int>(chunk.size()), chunk.data());
+    return properties;
+}
+
+hid_t compressed(const std::vector<hsize_t>& chunk)
+{
+    const hid_t properties = chunked(chunk);
+    H5Pset_deflate(properties, 1);
+    return properties;
+}
+
+/// Puts a stream of zeros into the place of slice 2.
+void putChunk(hid_t file, int size)
+{
+    const QByteArray stream = VolumeFile::deflated(QByteArray(size, '\0'));
+    const hsize_t start[] = {2, 0, 0};
+    const hid_t dataset = H5Dopen2(file, kLevel0, H5P_DEFAULT);
+    H5Dwrite_chunk(dataset, H5P_DEFAULT, 0, start, static_cast<size_t>(stream.size()), stream.constData());
+    H5Dclose(dataset);
+}
+
+hid_t externalStorage()
+{
+    const hid_t properties = H5Pcreate(H5P_DATASET_CREATE);
+    H5Pset_external(properties, "/etc/hostname", 0, 6);
+    return properties;
+}
+
+hid_t virtualStorage()
+{
+    const hid_t properties = H5Pcreate(H5P_DATASET_CREATE);
+    const hsize_t dims[] = {1, 2, 3};
+    const hid_t space = H5Screate_simple(3, dims, nullptr);
+    H5Pset_virtual(properties, space, "other.vol", "Lattices/Level0", space);
+    H5Sclose(space);
+    return properties;
+}
+
+hid_t variableText()
+{
+    const hid_t type = H5Tcopy(H5T_C_S1);
+    H5Tset_size(type, H5T_VARIABLE);
+    return type;
+}
+
+void putAttribute(hid_t file, const char* group, hid_t type, hsize_t count)
+{
+    const hid_t space = H5Screate_simple(1, &count, nullptr);
+    H5Aclose(H5Acreate_by_name(file, group, "Bad", type, space, H5P_DEFAULT, H5P_DEFAULT, H5P_DEFAULT));
+    H5Sclose(space);
+}
+
+void nest(hid_t file, int depth)
+{
+    hid_t group = H5Gopen2(file, "Parameters", H5P_DEFAULT);
+    for (int i = 0; i < depth; ++i) {
+        const hid_t below = H5Gcreate2(group, "Below", H5P_DEFAULT, H5P_DEFAULT, H5P_DEFAULT);
+        H5Gclose(group);
+        group = below;
+    }
+    H5Gclose(group);
+}
+
+const Hostile kHostile[] = {
+    {"ClaimsPixelsThatAreNotThere", "slice 0: is not in the file",
+     [](hid_t f) {
+         putDataset(f, kLevel0, H5T_STD_U16LE, {9, 20'000, 20'000}, compressed({1, 20'000, 20'000}));
+     }},
+    {"ChunkInflatesToAnotherLength", "slice 2: is damaged", [](hid_t f) { putChunk(f, 401); }},
+    {"ChunkInflatesWithoutEnd", "slice 2: is damaged", [](hid_t f) { putChunk(f, 200'000); }},
+    {"ChunkTooLarge", "chunks of more than",
+     [](hid_t f) {
+         putDataset(f, kLevel0, H5T_STD_U16LE, {1, 40'000, 20'000}, compressed({1, 40'000, 20'000}));
+     }},
+    {"TooManySlices", "dimension 0 is 1099511627776",
+     [](hid_t f) {
+         putDataset(f, kLevel0, H5T_STD_U8LE, {1ULL << 40, 1, 1}, compressed({1, 1, 1}));
+     }},
+    {"NoSlices", "dimension 0 is 0",
+     [](hid_t f) {
+         putDataset(f, kLevel0, H5T_STD_U8LE, {0, 1, 1}, compressed({1, 1, 1}));
+     }},
+    {"ChunkIsNotASlice", "dimension 0 is 2 in chunks of 2",
+     [](hid_t f) {
+         putDataset(f, kLevel0, H5T_STD_U8LE, {2, 4, 4}, compressed({2, 4, 4}));
+     }},
+    {"NotCompressed", "is not compressed",
+     [](hid_t f) {
+         putDataset(f, kLevel0, H5T_STD_U8LE, {2, 4, 4}, chunked({1, 4, 4}));
+     }},
+    {"BigEndian", "unknown type",
+     [](hid_t f) {
+         putDataset(f, kLevel0, H5T_STD_U16BE, {2, 4, 4}, compressed({1, 4, 4}));
+     }},
+    {"OtherFilter", "has filter",
+     [](hid_t f) {
+         const hid_t properties = compressed({1, 4, 4});
+         H5Pset_fletcher32(properties);
+         putDataset(f, kLevel0, H5T_STD_U16LE, {2, 4, 4}, properties);
+     }},
+    {"PixelsInAnotherFile", "not stored in chunks",
+     [](hid_t f) {
+         putDataset(f, kLevel0, H5T_STD_U8LE, {1, 2, 3}, externalStorage());
+     }},
+    {"VirtualPixels", "not stored in chunks",
+     [](hid_t f) {
+         putDataset(f, kLevel0, H5T_STD_U8LE, {1, 2, 3}, virtualStorage());
+     }},
+    {"VariableTexts", "neither numbers nor characters",
+     [](hid_t f) {
+         putDataset(f, kLevel0, variableText(), {1, 2, 3}, compressed({1, 2, 3}));
+     }},
+    {"GroupInPlaceOfALattice", "is no dataset",
+     [](hid_t f) { H5Gclose(H5Gcreate2(f, "Lattices/Group", H5P_DEFAULT, H5P_DEFAULT, H5P_DEFAULT)); }},
+    {"LinkToAnotherFile", "is a link to elsewhere",
+     [](hid_t f) { H5Lcreate_external("o.vol", "/", f, "Parameters/Link", H5P_DEFAULT, H5P_DEFAULT); }},
+    {"SoftLink", "is a link to elsewhere",
+     [](hid_t f) { H5Lcreate_soft("/Parameters", f, "Parameters/Link", H5P_DEFAULT, H5P_DEFAULT); }},
+    {"BundleInsideItself", "nested too deep",
+     [](hid_t f) { H5Lcreate_hard(f, "Parameters", f, "Parameters/Self", H5P_DEFAULT, H5P_DEFAULT); }},
+    {"BundlesTooDeep", "nested too deep", [](hid_t f) { nest(f, 8); }},
+    {"VariableTextAsParameter", "neither a fixed-length text",
+     [](hid_t f) { putAttribute(f, "Parameters", variableText(), 1); }},
+    {"ParameterOfAnotherType", "neither a fixed-length text",
+     [](hid_t f) { putAttribute(f, "Parameters", H5T_STD_I32LE, 1); }},
+    {"ListOfTexts", "wrong shape", [](hid_t f) { putAttribute(f, "Parameters", H5T_C_S1, 3); }},
+    {"LongParameterInPieces", "not one chunk",
+     [](hid_t f) { putDataset(f, "Parameters/Long", H5T_STD_I64LE, {9}, compressed({3})); }},
+    {"ParameterClaimsMoreThanThereIs", "is not in the file",
+     [](hid_t f) { putDataset(f, "Parameters/Long", H5T_STD_I64LE, {1 << 22}, compressed({1 << 22})); }},
+    {"TooManyCounts", "has 2097152 counts",
+     [](hid_t f) { putDataset(f, kHistogram, H5T_STD_U64LE, {1 << 21}, compressed({1 << 21})); }},
+    {"CountsOfAnotherType", "not one chunk of 64-bit counts",
+     [](hid_t f) { putDataset(f, kHistogram, H5T_STD_I64LE, {9}, compressed({9})); }},
+    {"LaterVersion", "format version",
+     [](hid_t f) {
+         H5Arename(f, "FormatVersion", "FormerVersion");
+         putAttribute(f, "/", H5T_STD_I64LE, 1);
+         H5Arename(f, "Bad", "FormatVersion");
+     }},
+};
+
+hid_t openForChange(const VolumeFileBuilder& builder)
+{
+    const hid_t access = H5Pcreate(H5P_FILE_ACCESS);
+    H5Pset_libver_bounds(access, H5F_LIBVER_LATEST, H5F_LIBVER_LATEST);
+    const hid_t file = H5Fopen(builder.path().constData(), H5F_ACC_RDWR, access);
+    H5Pclose(access);
+    return file;
+}
+
+class HostileVolumeFile : public testing::TestWithParam<Hostile>
+{
+};
+
+TEST_P(HostileVolumeFile, IsRefusedWithTheReason)
+{
+    const VolumeFileBuilder builder;
+    ASSERT_TRUE(builder.write(aLattice()).good());
+    const hid_t file = openForChange(builder);
+    GetParam().change(file);
+    ASSERT_GE(H5Fclose(file), 0);
+    const Result result = readAll(builder.bytes());
+    EXPECT_TRUE(result.text().contains(QLatin1String(GetParam().reason))) << qPrintable(result.text());
+}
+
+INSTANTIATE_TEST_SUITE_P(Each, HostileVolumeFile, testing::ValuesIn(kHostile),
+                         [](const auto& row) { return std::string(row.param.name); });
+
+// Both ways: the library decodes our slices with its own filters, and we decode those that it compresses, or stores as
+// they are because they cannot be compressed.
+TEST(ForeignVolumeFile, HasTheFiltersOfTheLibrary)
+{
+    const VolumeFileBuilder builder;
+    const Lattice lattice = aLattice();
+    ASSERT_TRUE(builder.write(lattice).good());
+    const hid_t file = openForChange(builder);
+    const hid_t dataset = H5Dopen2(file, kLevel0, H5P_DEFAULT);
+    QByteArray all(3 * 400, '\0');
+    H5Dread(dataset, H5T_STD_U16LE, H5S_ALL, H5S_ALL, H5P_DEFAULT, all.data());
+    EXPECT_EQ(all, sliceOf(lattice, 0).pixels + sliceOf(lattice, 1).pixels + sliceOf(lattice, 2).pixels);
+    const QByteArray smooth = QByteArray("abcdefgh").repeated(50);
+    const QByteArray changed = sliceOf(lattice, 2).pixels + smooth + sliceOf(lattice, 0).pixels;
+    H5Dwrite(dataset, H5T_STD_U16LE, H5S_ALL, H5S_ALL, H5P_DEFAULT, changed.constData());
+    H5Dclose(dataset);
+    H5Fclose(file);
+
+    Result result;
+    const auto mesh = OrlanMesh::read(builder.path(), result);
+    ASSERT_TRUE(mesh) << qPrintable(result.text());
+    QByteArray found;
+    for (int i = 0; i < 3; ++i) {
+        TypedData2D pixels;
+        EXPECT_TRUE(mesh->readSlice(lattice, i, pixels).good());
+        found += pixels.pixels;
+    }
+    EXPECT_EQ(found, changed);
+}
+
+}  // namespace

@@ -1,0 +1,203 @@
+#include "platform/volumefile/OrlanMesh.h"
+
+#include "platform/volumefile/SOPInstanceUtility.h"
+#include "platform/volumefile/VolumeFileBuilder.h"
+
+#include <QFile>
+
+#include <gtest/gtest.h>
+#include <sys/resource.h>
+
+#include <csignal>
+#include <limits>
+#include <thread>
+
+using namespace Kdd;
+
+namespace
+{
+
+/// Bytes that this process read from files so far.
+qint64 bytesRead()
+{
+    QFile file(QStringLiteral("/proc/self/io"));
+    if (!file.open(QIODevice::ReadOnly))
+        return -1;
+    return file.readLine().mid(int(sizeof "rchar:")).trimmed().toLongLong();
+}
+
+ParamBundle parametersOfEachKind()
+{
+    ParamBundle below;
+    below.insert("", {});
+    ParamBundle dicom;
+    dicom.insert("G0020-000E", Parameter::ofText("UI:1.2.3"));
+    dicom.insert("Empty", Parameter::ofText(""));
+    ParamBundle all;
+    all.insert("DataMinMax", Parameter::ofIntegers({std::numeric_limits<qint64>::min(), 7}));
+    all.insert("None", Parameter::ofIntegers({}));
+    all.insert("DataWindowScale", Parameter::ofReals({0.1}));
+    all.insert("LongIntegers", Parameter::ofIntegers(QVector<qint64>(40'000, -5)));
+    all.insert("LongReals", Parameter::ofReals(QVector<double>(4'001, 1e300)));
+    all.insertBundle("DICOM", dicom);
+    return all;
+}
+
+void expectEqual(const ParamBundle& left, const ParamBundle& right)
+{
+    ASSERT_EQ(left.parameters().keys(), right.parameters().keys());
+    for (const QByteArray& name : left.parameters().keys()) {
+        const Parameter& a = left.parameters()[name];
+        const Parameter& b = right.parameters()[name];
+        EXPECT_TRUE(a.kind == b.kind && a.text == b.text && a.integers == b.integers && a.reals == b.reals)
+            << name.constData();
+    }
+    ASSERT_EQ(left.bundles().keys(), right.bundles().keys());
+    for (const QByteArray& name : left.bundles().keys())
+        expectEqual(left.bundle(name), right.bundle(name));
+}
+
+void expectAllSlices(const OrlanMesh& mesh, const Lattice& lattice)
+{
+    const Lattice* found = mesh.findLattice("Level", 3);
+    ASSERT_TRUE(found != nullptr && found->dims == lattice.dims && found->type == lattice.type &&
+                found->components == lattice.components);
+    for (int i = 0; i < lattice.dims.at(2); ++i) {
+        TypedData2D pixels;
+        const Result result = mesh.readSlice(*found, i, pixels);
+        ASSERT_TRUE(result.good()) << qPrintable(result.text());
+        EXPECT_TRUE(pixels.width == 20 && pixels.height == 10 && pixels.pixels == sliceOf(lattice, i).pixels);
+    }
+    TypedData2D pixels;
+    EXPECT_TRUE(mesh.readSlice(*found, -1, pixels).bad() &&
+                mesh.readSlice(*found, lattice.dims.at(2), pixels).bad());
+}
+
+TEST(OrlanMesh, GivesBackSlicesOfEveryTypeFromPathAndMemory)
+{
+    for (int type = 0; type < 8; ++type) {
+        for (const int components : {1, 3}) {
+            const VolumeFileBuilder file;
+            const Lattice lattice = aLattice(static_cast<PrimitiveType>(type), components);
+            Result result = file.write(lattice);
+            ASSERT_TRUE(result.good()) << qPrintable(result.text());
+            const auto fromPath = OrlanMesh::read(file.path(), result);
+            ASSERT_TRUE(fromPath) << qPrintable(result.text());
+            expectAllSlices(*fromPath, lattice);
+            const auto fromMemory = OrlanMesh::read(file.bytes(), "memory", result);
+            ASSERT_TRUE(fromMemory) << qPrintable(result.text());
+            expectAllSlices(*fromMemory, lattice);
+        }
+    }
+}
+
+TEST(OrlanMesh, GivesBackParametersAndCounts)
+{
+    const VolumeFileBuilder file;
+    Result result = file.write(aLattice(), parametersOfEachKind());
+    ASSERT_TRUE(result.good()) << qPrintable(result.text());
+    const auto mesh = OrlanMesh::read(file.path(), result);
+    ASSERT_TRUE(mesh) << qPrintable(result.text());
+    expectEqual(mesh->parameters(), parametersOfEachKind());
+    QVector<quint64> counts;
+    EXPECT_TRUE(mesh->hasDataSection("Histogram") && mesh->readDataSection("Histogram", counts).good());
+    EXPECT_EQ(counts, (QVector<quint64>{1, 0, ~quint64(0)}));
+    EXPECT_TRUE(mesh->readDataSection("Absent", counts).bad());
+}
+
+TEST(OrlanMesh, KeepsTheImagesOfThousandsOfSlices)
+{
+    std::vector<std::string> uids;
+    for (int i = 0; i < 12'000; ++i)
+        uids.push_back("1.2.276.0.7230010.3.1.4.296485376.1.1521713414.1800." + std::to_string(i));
+    ParamBundle parameters;
+    parameters.insertBundle("SOPInstanceUIDs", SOPInstanceUtility::bundleOf(uids));
+    const VolumeFileBuilder file;
+    Result result = file.write(aLattice(), parameters);
+    const auto mesh = OrlanMesh::read(file.path(), result);
+    ASSERT_TRUE(mesh) << qPrintable(result.text());
+    EXPECT_EQ(SOPInstanceUtility::sopUIDList(mesh->parameters().bundle("SOPInstanceUIDs")), uids);
+    EXPECT_TRUE(SOPInstanceUtility::sopUIDList(SOPInstanceUtility::bundleOf({})).empty());
+}
+
+TEST(ParamBundle, CountsNumbersOutOfRangeAsAbsent)
+{
+    ParamBundle bundle;
+    bundle.insert("Large", Parameter::ofIntegers({1LL << 31}));
+    bundle.insert("NaN", Parameter::ofReals({std::numeric_limits<double>::quiet_NaN()}));
+    bundle.insert("Text", Parameter::ofText("7"));
+    bundle.insert("Real", Parameter::ofReals({-7.0, 1}));
+    for (const char* name : {"Large", "NaN", "Text", "Absent"})
+        EXPECT_EQ(bundle.integer(name, 3), 3) << name;
+    EXPECT_EQ(bundle.integer("Real", 3), -7);
+}
+
+TEST(OrlanMesh, ReadsOneSliceWithoutTheOthers)
+{
+    const VolumeFileBuilder file;
+    const Lattice lattice = aLattice(PrimitiveType::UInt8, 1, 5'000);
+    Result result = file.write(lattice);
+    const qint64 before = bytesRead();
+    const auto mesh = OrlanMesh::read(file.path(), result);
+    ASSERT_TRUE(mesh) << qPrintable(result.text());
+    TypedData2D pixels;
+    EXPECT_TRUE(mesh->readSlice(lattice, 4'321, pixels).good());
+    EXPECT_EQ(pixels.pixels, sliceOf(lattice, 4'321).pixels);
+    EXPECT_LT(bytesRead() - before, QFile(QFile::decodeName(file.path())).size() / 20);
+}
+
+TEST(OrlanMesh, IsReadOnSeveralThreads)
+{
+    const VolumeFileBuilder file;
+    const Lattice lattice = aLattice();
+    ASSERT_TRUE(file.write(lattice).good());
+    const QByteArray bytes = file.bytes();
+    const auto work = [&] {
+        for (int i = 0; i < 20; ++i) {
+            Result result;
+            const auto mesh =
+                i % 2 != 0 ? OrlanMesh::read(bytes, "memory", result) : OrlanMesh::read(file.path(), result);
+            ASSERT_TRUE(mesh) << qPrintable(result.text());
+            expectAllSlices(*mesh, lattice);
+        }
+    };
+    std::thread other(work);
+    work();
+    other.join();
+}
+
+TEST(OrlanMeshWriter, LeavesNothingWhenItIsNotFinished)
+{
+    const VolumeFileBuilder file;
+    Result result;
+    auto writer = OrlanMeshWriter::create(file.path(), aLattice(), result);
+    ASSERT_TRUE(writer) << qPrintable(result.text());
+    EXPECT_TRUE(writer->writeSlice(0, sliceOf(aLattice(), 0)).good());
+    EXPECT_TRUE(writer->writeSlice(1, sliceOf(aLattice(PrimitiveType::Int16), 1)).bad());
+    EXPECT_TRUE(writer->writeSlice(3, sliceOf(aLattice(), 3)).bad());
+    EXPECT_TRUE(writer->finish().bad());  // slices are missing
+    EXPECT_FALSE(OrlanMesh::isVolumeFile(file.path()));
+    writer.reset();
+    EXPECT_EQ(file.files(), QStringList());
+}
+
+TEST(OrlanMeshWriter, ReportsAFullDiskAndKeepsTheFormerFile)
+{
+    const VolumeFileBuilder file;
+    ASSERT_TRUE(file.write(aLattice()).good());
+    const QByteArray former = file.bytes();
+    // A limit to the length of files takes the place of the full disk.
+    rlimit limit = {};
+    getrlimit(RLIMIT_FSIZE, &limit);
+    const rlimit small = {8'000, limit.rlim_max};
+    const auto handler = std::signal(SIGXFSZ, SIG_IGN);
+    setrlimit(RLIMIT_FSIZE, &small);
+    const Result result = file.write(aLattice(PrimitiveType::Float64, 3, 20));
+    setrlimit(RLIMIT_FSIZE, &limit);
+    std::signal(SIGXFSZ, handler);
+    EXPECT_TRUE(result.text().contains(QLatin1String("a.vol"))) << qPrintable(result.text());
+    EXPECT_EQ(file.files(), QStringList(QStringLiteral("a.vol")));
+    EXPECT_EQ(file.bytes(), former);
+}
+
+}  // namespace

@@ -1,0 +1,57 @@
+#include "platform/volumefile/VolumeFileBuilder.h"
+
+#include <QDir>
+#include <QFile>
+
+#include <random>
+
+namespace Kdd
+{
+
+Lattice aLattice(PrimitiveType type, int components, int slices)
+{
+    return {"Level0", {20, 10, slices}, type, components};
+}
+
+TypedData2D sliceOf(const Lattice& lattice, int slice)
+{
+    TypedData2D data{lattice.dims.at(0), lattice.dims.at(1), lattice.components, lattice.type, {}};
+    data.pixels.resize(static_cast<int>(data.rowStride()) * data.height);
+    std::minstd_rand random(static_cast<unsigned>(slice + 1));
+    for (char& byte : data.pixels)
+        byte = static_cast<char>(random());
+    return data;
+}
+
+QStringList VolumeFileBuilder::files() const
+{
+    return QDir(mFolder.path()).entryList(QDir::Files | QDir::Hidden);
+}
+
+Result VolumeFileBuilder::write(const Lattice& lattice, const ParamBundle& parameters) const
+{
+    Result result;
+    const auto writer = OrlanMeshWriter::create(path(), lattice, result);
+    for (int i = lattice.dims.at(2) - 1; i >= 0 && result.good(); --i)
+        result = writer->writeSlice(i, sliceOf(lattice, i));
+    if (result.good())
+        result = writer->writeParameters(parameters);
+    if (result.good())
+        result = writer->writeDataSection("Histogram", {1, 0, ~quint64(0)});
+    return result.good() ? writer->finish() : result;
+}
+
+QByteArray VolumeFileBuilder::bytes() const
+{
+    QFile file(QFile::decodeName(path()));
+    return file.open(QIODevice::ReadOnly) ? file.readAll() : QByteArray();
+}
+
+void VolumeFileBuilder::replace(const QByteArray& bytes) const
+{
+    QFile file(QFile::decodeName(path()));
+    if (file.open(QIODevice::WriteOnly | QIODevice::Truncate))
+        file.write(bytes);
+}
+
+}  // namespace Kdd
