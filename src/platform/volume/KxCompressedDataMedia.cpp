@@ -1,0 +1,187 @@
+#include "platform/volume/KxCompressedDataMedia.h"
+
+#include "platform/base/LogFile.h"
+#include "platform/os/RandomAccessFile.h"
+#include "platform/volume/ffmpeg/VideoModule.h"
+
+#include <QDir>
+#include <QFile>
+#include <QFileInfo>
+#include <QStringList>
+
+#include <dlfcn.h>
+#include <link.h>
+
+#include <algorithm>
+#include <cmath>
+#include <limits>
+#include <new>
+#include <system_error>
+
+namespace Kdd
+{
+namespace
+{
+
+/// Part of a file.
+class FileRange : public MediaSource
+{
+public:
+    Result open(const QString& path, qint64 offset, qint64 size)
+    {
+        const int error = mFile.open(QFile::encodeName(path).constData());
+        if (error != 0)
+            return Result::failure(QString::fromLocal8Bit(std::system_category().message(error).c_str()));
+        if (offset < 0 || size <= 0 || offset >= mFile.size())
+            return Result::failure(QStringLiteral("there are no %1 bytes at %2").arg(size).arg(offset));
+        mOffset = offset;
+        // What is there of a file that was cut short may be enough.
+        mSize = std::min(size, mFile.size() - offset);
+        return {};
+    }
+
+    qint64 size() const override { return mSize; }
+
+    qint64 read(qint64 offset, char* out, qint64 length) override
+    {
+        return mFile.readAt(mOffset + offset, out, std::min(length, mSize - offset));
+    }
+
+private:
+    RandomAccessFile mFile;
+    qint64 mOffset = 0;
+    qint64 mSize = 0;
+};
+
+/// The folder of the library or program that holds this code.
+QString ownFolder()
+{
+    Dl_info info = {};
+    link_map* map = nullptr;
+    const auto* here = reinterpret_cast<const void*>(&ownFolder);
+    if (::dladdr1(here, &info, reinterpret_cast<void**>(&map), RTLD_DL_LINKMAP) == 0 || map == nullptr)
+        return {};
+    // The program itself has no name there, and how it was called need not lead to its file.
+    const QString file =
+        *map->l_name == '\0' ? QStringLiteral("/proc/self/exe") : QFile::decodeName(map->l_name);
+    return QFileInfo(QFileInfo(file).canonicalFilePath()).path();
+}
+
+QStringList moduleFolders()
+{
+    if (qEnvironmentVariableIsSet("KDD_MODULE_FOLDER"))
+        return {QFile::decodeName(qgetenv("KDD_MODULE_FOLDER"))};
+    const QString own = ownFolder();
+    QStringList folders = {own + QLatin1String("/kddlib")};
+    // Only what was not installed looks where it was built: elsewhere anybody might have made a folder of that name.
+    const QString build = QStringLiteral(KDD_BUILD_FOLDER "/");
+    if ((own + QLatin1Char('/')).startsWith(build))
+        folders.append(build + QLatin1String("kddlib"));
+    return folders;
+}
+
+struct VideoModule
+{
+    VideoModuleEntry entry = nullptr;
+    QString reason;
+};
+
+VideoModule openModule(const QString& path)
+{
+    VideoModule module;
+    // All symbols now: one that is missing should be a message here and not the end of the process later.
+    void* handle = ::dlopen(QFile::encodeName(path).constData(), RTLD_NOW | RTLD_LOCAL);
+    void* entry = handle == nullptr ? nullptr : ::dlsym(handle, kVideoModuleEntry);
+    module.entry = reinterpret_cast<VideoModuleEntry>(entry);
+    if (entry == nullptr)
+        module.reason =
+            QStringLiteral("The video module cannot be loaded: %1").arg(QString::fromLocal8Bit(::dlerror()));
+    return module;
+}
+
+VideoModule findModule()
+{
+    const QStringList folders = moduleFolders();
+    for (const QString& folder : folders) {
+        const QString path = QDir(folder).absoluteFilePath(QLatin1String(kVideoModuleFile));
+        if (QFileInfo::exists(path))
+            return openModule(path);
+    }
+    return {nullptr, QStringLiteral("The video module %1 is not installed in %2")
+                         .arg(QLatin1String(kVideoModuleFile), folders.join(QLatin1String(" or ")))};
+}
+
+// Nothing may be thrown through the decoders: they are C.
+std::int64_t readSource(void* source, std::int64_t offset, void* out, std::int64_t length) noexcept
+{
+    try {
+        return static_cast<MediaSource*>(source)->read(offset, static_cast<char*>(out), length);
+    } catch (const std::exception& fault) {
+        LogFile::warnf("Reading of a video failed: %s", fault.what());
+        return -1;
+    }
+}
+
+unsigned char* allocateFrame(void* target, std::int32_t width, std::int32_t height) noexcept
+{
+    auto& frame = *static_cast<TypedData2D*>(target);
+    const qint64 size = qint64{width} * height * 3;
+    if (size <= 0 || size > std::numeric_limits<int>::max() / 2)
+        return nullptr;
+    try {
+        frame.pixels.resize(static_cast<int>(size));
+    } catch (const std::bad_alloc&) {
+        return nullptr;
+    }
+    frame.width = width;
+    frame.height = height;
+    frame.components = 3;
+    return reinterpret_cast<unsigned char*>(frame.pixels.data());
+}
+
+}  // namespace
+
+Result KxCompressedDataMedia::decodeRepresentativeFrame(MediaSource& source, int width, int height,
+                                                        double fraction, TypedData2D& frame)
+{
+    static const VideoModule module = findModule();
+    if (module.entry == nullptr)
+        return Result::failure(module.reason);
+    if (width <= 0 || height <= 0 || std::isnan(fraction))
+        return Result::failure(QStringLiteral("No frame has the size %1 x %2").arg(width).arg(height));
+
+    TypedData2D decoded;
+    VideoRequest request;
+    request.width = width;
+    request.height = height;
+    request.fraction = std::clamp(fraction, 0.0, 1.0);
+    request.source = &source;
+    request.size = source.size();
+    request.read = &readSource;
+    request.target = &decoded;
+    request.allocate = &allocateFrame;
+    if (module.entry(&request) != 1) {
+        // A module of another version does not touch the request.
+        const QString reason = QString::fromUtf8(static_cast<const char*>(request.reason));
+        return Result::failure(
+            QStringLiteral("No frame can be decoded: ") +
+            (reason.isEmpty() ? QStringLiteral("the video module is of another version") : reason));
+    }
+    frame = decoded;
+    return {};
+}
+
+TypedData2D KxCompressedDataMedia::decodeRepresentativeFrame(const QString& path, qint64 offset, qint64 size,
+                                                             int width, int height, double fraction)
+{
+    FileRange range;
+    TypedData2D frame;
+    Result result = range.open(path, offset, size);
+    if (result.good())
+        result = decodeRepresentativeFrame(range, width, height, fraction, frame);
+    if (result.bad())
+        LogFile::warnf("No preview of the video %s: %s", qUtf8Printable(path), qUtf8Printable(result.text()));
+    return frame;
+}
+
+}  // namespace Kdd

@@ -1,0 +1,126 @@
+#include "platform/volume/KxVolumeInfo.h"
+
+#include "platform/volume/CompressedFrame.h"
+#include "platform/volume/FragmentReader.h"
+#include "platform/volume/ImageAttributes.h"
+#include "platform/volume/KxCompressedDataMedia.h"
+#include "platform/volume/ShownPixels.h"
+#include "platform/volume/StoredFrame.h"
+
+#include <dcmtk/config/osconfig.h>
+
+#include <dcmtk/dcmdata/dcdatset.h>
+#include <dcmtk/dcmdata/dcdeftag.h>
+
+namespace Kdd
+{
+
+namespace
+{
+
+using Info = std::shared_ptr<KxVolumeInfo>;
+
+constexpr double kVideoFraction = 0.3;
+
+Info infoOf(const ShownPixels& shown, double aspect, bool isInverted)
+{
+    const ShownPixels spread = spreadNarrowRange(shown);
+    return std::make_shared<KxVolumeInfo>(
+        spread.pixels, static_cast<KxVolumeInfo::ComponentCode>(spread.pixels.components),
+        toFloat(spread.range.lowest), toFloat(spread.range.highest), toFloat(aspect), isInverted);
+}
+
+/// Frames of the middle third, the middle one first: of segmentations it may well be empty.
+QVector<int> candidates(int frames)
+{
+    QVector<int> numbers;
+    for (const int twelfth : {6, 5, 7, 4, 8}) {
+        const auto number = static_cast<int>(qint64(frames) * twelfth / 12);
+        if (number < frames && !numbers.contains(number))
+            numbers.append(number);
+    }
+    return numbers;
+}
+
+bool isBlank(const TypedData2D& pixels)
+{
+    const ValueRange range = rangeOf(pixels);
+    return !(range.lowest < range.highest);
+}
+
+/// The first candidate that shows something, else the first that can be decoded, else why the first cannot.
+Result readRepresentative(DcmDataset& dataset, int least, int& number, StoredFrame& frame)
+{
+    Result result;
+    bool isFound = false;
+    for (const int candidate : candidates(numberOfFrames(dataset))) {
+        StoredFrame read;
+        const Result reading = readStoredFrame(dataset, candidate, least, read);
+        if (reading.bad() && result.good())
+            result = reading;
+        const bool showsMore = reading.good() && (!isFound || !isBlank(read.pixels));
+        if (showsMore) {
+            number = candidate;
+            frame = read;
+            isFound = true;
+        }
+        if (isFound && !isBlank(frame.pixels))
+            break;
+    }
+    return isFound ? Result() : result;
+}
+
+bool isInverted(DcmDataset& dataset)
+{
+    return textOf(dataset, DCM_PhotometricInterpretation) == "MONOCHROME1" ||
+           textOf(dataset, DCM_PresentationLUTShape) == "INVERSE";
+}
+
+Info showFrame(DcmDataset& dataset, int width, int height, Result& result)
+{
+    int number = 0;
+    StoredFrame frame;
+    result = readRepresentative(dataset, qMax(width, height), number, frame);
+    if (result.bad())
+        return nullptr;
+    const double aspect = pixelAspect(ImageAttributes(dataset, number));
+    if (frame.colour == StoredFrame::Colour::Grey)
+        return infoOf(showGrey(dataset, number, frame, width, height), aspect, isInverted(dataset));
+    ShownPixels shown;
+    result = showColour(dataset, frame, width, height, shown);
+    return result.good() ? infoOf(shown, aspect, false) : nullptr;
+}
+
+Info showVideo(DcmPixelSequence& fragments, int width, int height, Result& result)
+{
+    FragmentSource source(fragments);
+    TypedData2D frame;
+    result = KxCompressedDataMedia::decodeRepresentativeFrame(source, width, height, kVideoFraction, frame);
+    return result.good() ? KxVolumeInfo::fromFrame(nullptr, frame) : nullptr;
+}
+
+DcmPixelSequence* findVideo(DcmDataset& dataset)
+{
+    DcmElement* pixels = nullptr;
+    E_TransferSyntax xfer = EXS_Unknown;
+    DcmPixelSequence* fragments =
+        dataset.findAndGetElement(DCM_PixelData, pixels).good() ? findFragments(*pixels, xfer) : nullptr;
+    return isVideo(xfer) ? fragments : nullptr;
+}
+
+}  // namespace
+
+Info KxVolumeInfo::readVolumeInfo(DcmDataset* dataset, int width, int height, const QString& path,
+                                  Result& result)
+{
+    if (!dataset) {
+        result = Result::failure(QStringLiteral("There is no dataset")).within(path);
+        return nullptr;
+    }
+    DcmPixelSequence* video = findVideo(*dataset);
+    Info info = video ? showVideo(*video, width, height, result) : showFrame(*dataset, width, height, result);
+    result = result.within(path);
+    return info;
+}
+
+}  // namespace Kdd

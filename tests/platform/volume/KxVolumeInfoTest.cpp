@@ -1,0 +1,266 @@
+#include "PixelDataset.h"
+#include "platform/volumefile/OrlanMesh.h"
+#include "platform/volumefile/OrlanMeshWriter.h"
+
+#include <QFile>
+#include <QProcess>
+#include <QTemporaryDir>
+
+#include <gtest/gtest.h>
+
+#include <limits>
+
+using namespace Kdd;
+
+namespace
+{
+
+std::shared_ptr<KxVolumeInfo> show(const PixelDataset& image, int width = 0, int height = 0)
+{
+    Result result;
+    auto info =
+        KxVolumeInfo::readVolumeInfo(&image.dataset(), width, height, QStringLiteral("image.dcm"), result);
+    EXPECT_TRUE(result.good()) << qPrintable(result.text());
+    return info;
+}
+
+PixelDataset ramp()
+{
+    return PixelDataset(1, 4, 16).words({0, 100, 1000, 2000});
+}
+
+PixelDataset signedRamp()
+{
+    return PixelDataset(1, 4, 16)
+        .with(DCM_PixelRepresentation, "1")
+        .words({0xf830, 0xff9c, 0, 1000});  // -2000, -100
+}
+
+PixelDataset lookUp(const std::vector<Uint16>& descriptor, const std::vector<Uint16>& entries)
+{
+    return PixelDataset::item().numbers(DCM_LUTDescriptor, descriptor).words(entries, DCM_LUTData);
+}
+
+/// Attributes of a frame as enhanced images keep them.
+PixelDataset group(const DcmTagKey& sequence, const PixelDataset& attributes)
+{
+    return PixelDataset::item().withItem(sequence, attributes);
+}
+
+PixelDataset window(const char* center, const char* width)
+{
+    return PixelDataset::item().with(DCM_WindowCenter, center).with(DCM_WindowWidth, width);
+}
+
+struct RangeCase
+{
+    const char* name;
+    PixelDataset image;
+    double lowest;
+    double highest;
+};
+
+const RangeCase kRanges[] = {
+    {"OfThePixels", ramp(), 0, 2000},
+    {"OfTheWindow", ramp().with(DCM_WindowCenter, "500").with(DCM_WindowWidth, "400"), 300, 700},
+    {"OfTheFirstUsableWindow", ramp().with(DCM_WindowCenter, "5\\500").with(DCM_WindowWidth, "0\\400"), 300,
+     700},
+    {"NotOfAWindowBesideThePixels", ramp().with(DCM_WindowCenter, "9000").with(DCM_WindowWidth, "400"), 0,
+     2000},
+    {"NotOfAWindowThatIsNoNumber", ramp().with(DCM_WindowCenter, "x").with(DCM_WindowWidth, "400"), 0, 2000},
+    {"Rescaled", ramp().with(DCM_RescaleSlope, "2").with(DCM_RescaleIntercept, "-1000"), -1000, 3000},
+    {"RescaledDownwards", ramp().with(DCM_RescaleSlope, "-1").with(DCM_RescaleIntercept, "0"), -2000, 0},
+    {"WithoutPadding", signedRamp().numbers(DCM_PixelPaddingValue, {0xf830}), -100, 1000},
+    {"WithoutPaddingRange",
+     signedRamp().numbers(DCM_PixelPaddingValue, {0xf830}).numbers(DCM_PixelPaddingRangeLimit, {0xff9c}), 0,
+     1000},
+    {"OfTheModalityTable", ramp().withItem(DCM_ModalityLUTSequence, lookUp({3, 99, 16}, {7, 500, 900})), 7,
+     900},
+    {"OfTheVoiTable", ramp().withItem(DCM_VOILUTSequence, lookUp({2, 99, 16}, {10, 4000})), 10, 4000},
+    {"OfTheWindowOfTheFrame",
+     ramp()
+         .withItem(DCM_SharedFunctionalGroupsSequence, group(DCM_FrameVOILUTSequence, window("9", "9")))
+         .withItem(DCM_PerFrameFunctionalGroupsSequence,
+                   group(DCM_FrameVOILUTSequence, window("500", "400"))),
+     300, 700},
+    {"RescaledAsAllFramesAre",
+     ramp().withItem(DCM_SharedFunctionalGroupsSequence,
+                     group(DCM_PixelValueTransformationSequence,
+                           PixelDataset::item().with(DCM_RescaleSlope, "3").with(DCM_RescaleIntercept, "1"))),
+     1, 6001},
+};
+
+TEST(KxVolumeInfo, TakesTheRangeFromWhereTheImageTellsIt)
+{
+    for (const RangeCase& range : kRanges) {
+        const auto info = show(range.image);
+        ASSERT_TRUE(info) << range.name;
+        EXPECT_EQ(info->lowestValue(), float(range.lowest)) << range.name;
+        EXPECT_EQ(info->highestValue(), float(range.highest)) << range.name;
+    }
+}
+
+TEST(KxVolumeInfo, AppliesTablesAndRescaleToPixels)
+{
+    const auto modality = ramp().withItem(DCM_ModalityLUTSequence, lookUp({3, 99, 16}, {7, 500, 900}));
+    EXPECT_EQ(numbersOf(*show(modality)), (QVector<double>{7, 500, 900, 900}));
+    const auto rescaled = ramp().with(DCM_RescaleSlope, "2").with(DCM_RescaleIntercept, "-1000");
+    EXPECT_EQ(numbersOf(*show(rescaled)), (QVector<double>{-1000, -800, 1000, 3000}));
+}
+
+TEST(KxVolumeInfo, SpreadsARangeOfFewSteps)
+{
+    const auto info = show(PixelDataset(1, 4, 1).bytes({0x0a, 0}));  // 0 1 0 1
+    EXPECT_EQ(numbersOf(*info), (QVector<double>{0, 65535, 0, 65535}));
+    EXPECT_EQ(info->highestValue(), 65535);
+    const auto mask = PixelDataset(2, 4, 1).bytes({0x0b, 0});  // 1 1 0 1 above 0 0 0 0
+    EXPECT_EQ(numbersOf(*show(mask, 2, 1)), (QVector<double>{32767.5, 16383.75}));
+}
+
+TEST(KxVolumeInfo, FloatPixelsWithoutValueAreBlack)
+{
+    const float values[] = {-100, std::numeric_limits<float>::quiet_NaN(), 700, 9999};
+    auto image = PixelDataset(1, 4, 32);
+    image.dataset().putAndInsertFloat32Array(DcmTag(DCM_FloatPixelData, EVR_OF), values, 4);
+    image.dataset().putAndInsertFloat32(DCM_FloatPixelPaddingValue, 9999);
+    const auto info = show(image);
+    EXPECT_EQ(numbersOf(*info), (QVector<double>{-100, -100, 700, 9999}));
+    EXPECT_EQ(info->highestValue(), 700);
+    EXPECT_EQ(info->primitiveType(), PrimitiveType::Float32);
+}
+
+TEST(KxVolumeInfo, ReducesByMeansOfWholeBlocks)
+{
+    const auto image = PixelDataset(2, 5, 8).bytes({10, 20, 100, 110, 9, 30, 43, 120, 131, 9});
+    EXPECT_EQ(numbersOf(*show(image, 2, 1)), (QVector<double>{26, 115}));
+    EXPECT_EQ(show(image, 3, 1)->width(), 5);  // halves would be below three
+}
+
+struct AspectCase
+{
+    const char* name;
+    DcmTagKey key;
+    const char* value;
+    float aspect;
+};
+
+const AspectCase kAspects[] = {
+    {"Spacing", DCM_PixelSpacing, "2\\1", 0.5F},      {"Imager", DCM_ImagerPixelSpacing, "0.5\\1", 2},
+    {"Ratio", DCM_PixelAspectRatio, "4\\3", 0.75F},   {"Zero", DCM_PixelSpacing, "0\\1", 1},
+    {"Unbelievable", DCM_PixelSpacing, "1\\1000", 1}, {"One", DCM_PixelSpacing, "1", 1}};
+
+TEST(KxVolumeInfo, AspectIsWidthOverHeight)
+{
+    for (const AspectCase& aspect : kAspects)
+        EXPECT_EQ(show(ramp().with(aspect.key, aspect.value))->pixelAspectRatio(), aspect.aspect)
+            << aspect.name;
+}
+
+TEST(KxVolumeInfo, LowValuesAreWhiteWhereTheImageSaysSo)
+{
+    EXPECT_TRUE(show(ramp().with(DCM_PhotometricInterpretation, "MONOCHROME1"))->isInverted());
+    EXPECT_TRUE(show(ramp().with(DCM_PresentationLUTShape, "INVERSE"))->isInverted());
+    EXPECT_FALSE(show(ramp())->isInverted());
+}
+
+PixelDataset paletteImage(const std::vector<Uint16>& descriptor, const std::vector<Uint16>& red)
+{
+    auto image =
+        PixelDataset(1, 3, 8).with(DCM_PhotometricInterpretation, "PALETTE COLOR").bytes({0, 5, 9, 0});
+    image.numbers(DCM_RedPaletteColorLookupTableDescriptor, descriptor);
+    image.numbers(DCM_GreenPaletteColorLookupTableDescriptor, descriptor);
+    image.numbers(DCM_BluePaletteColorLookupTableDescriptor, descriptor);
+    image.words(red, DCM_RedPaletteColorLookupTableData);
+    image.words(std::vector<Uint16>(red.size(), 0), DCM_GreenPaletteColorLookupTableData);
+    return image.words(std::vector<Uint16>(red.size(), 0), DCM_BluePaletteColorLookupTableData);
+}
+
+TEST(KxVolumeInfo, AppliesPalettesOfEightAndSixteenBits)
+{
+    const QVector<double> expected{0x10, 0, 0, 0x20, 0, 0, 0x30, 0, 0};  // below, at and above the entries
+    EXPECT_EQ(numbersOf(*show(paletteImage({3, 4, 16}, {0x1000, 0x2000, 0x3000}))), expected);
+    EXPECT_EQ(numbersOf(*show(paletteImage({3, 4, 8}, {0x10, 0x20, 0x30}))), expected);
+    EXPECT_EQ(numbersOf(*show(paletteImage({3, 4, 8}, {0x2010, 0x0030}))),
+              expected);  // packed, two to a word
+}
+
+TEST(KxVolumeInfo, RefusesAPaletteOfFewerEntriesThanItSays)
+{
+    Result result;
+    const auto image = paletteImage({300, 0, 16}, {1, 2, 3});
+    EXPECT_FALSE(KxVolumeInfo::readVolumeInfo(&image.dataset(), 8, 8, QStringLiteral("image.dcm"), result));
+    EXPECT_STREQ(qPrintable(result.text()), "image.dcm: Palette: A look-up table of 300 entries has 6 bytes");
+}
+
+TEST(KxVolumeInfo, OfManyFramesAnEmptyOneIsNotShown)
+{
+    std::vector<Uint8> values(24, 0);
+    values[11] = 200;  // the second pixel of the sixth of twelve frames; the middle one is the seventh
+    const auto info = show(PixelDataset(1, 2, 8).with(DCM_NumberOfFrames, "12").bytes(values));
+    EXPECT_EQ(numbersOf(*info), (QVector<double>{0, 200}));
+}
+
+TEST(KxVolumeInfo, OfAVideoShowsAFrameAtThreeTenths)
+{
+    const QTemporaryDir folder;
+    const QString path = folder.filePath(QStringLiteral("fade.mp4"));
+    const char* fade =
+        "-loglevel error -f lavfi -i color=red:s=64x64:r=10:d=4,fade=out:st=0:d=4:color=blue -c:v libx264";
+    ASSERT_EQ(QProcess::execute(QStringLiteral("ffmpeg"), QString::fromLatin1(fade).split(QLatin1Char(' '))
+                                                              << path),
+              0);
+    QFile video(path);
+    ASSERT_TRUE(video.open(QIODevice::ReadOnly));
+    const QByteArray head = video.read(1000);  // the fragments of a video are cut anywhere
+    auto* pixels = new DcmPixelData(DCM_PixelData);
+    pixels->putOriginalRepresentation(EXS_MPEG4HighProfileLevel4_1, nullptr,
+                                      sequenceOf({"", head, video.readAll()}).release());
+    const auto image = PixelDataset(64, 64, 8).colour("YBR_PARTIAL_420").with(DCM_NumberOfFrames, "40");
+    image.dataset().insert(pixels);
+    const auto info = show(image, 32, 32);
+    ASSERT_TRUE(info);
+    EXPECT_EQ(info->width(), 32);
+    EXPECT_NEAR(numbersOf(*info).at(0), 255 * 0.7, 12);  // red
+    EXPECT_NEAR(numbersOf(*info).at(2), 255 * 0.3, 12);  // blue
+}
+
+TEST(KxVolumeInfo, FramesFromElsewhereAreShownAsTheyAre)
+{
+    const TypedData2D frame{1, 1, 3, PrimitiveType::UInt8, QByteArray("\x01\x02\x03")};
+    const auto info = KxVolumeInfo::fromFrame(nullptr, frame);
+    EXPECT_EQ(numbersOf(*info), (QVector<double>{1, 2, 3}));
+    EXPECT_EQ(info->highestValue(), 255);
+    EXPECT_FALSE(
+        KxVolumeInfo::fromFrame(nullptr, TypedData2D{2, 1, 3, PrimitiveType::UInt8, QByteArray("abc")}));
+    EXPECT_FALSE(KxVolumeInfo::fromFrame(nullptr, TypedData2D()));
+}
+
+TEST(KxVolumeInfo, ShowsASliceOfAVolumeFileInItsWindow)
+{
+    const QTemporaryDir folder;
+    const QByteArray path = folder.filePath(QStringLiteral("volume.h5")).toLocal8Bit();
+    Result result;
+    const Lattice lattice{"Level0", {2, 1, 2}, PrimitiveType::UInt16, 1};
+    auto writer = OrlanMeshWriter::create(path, lattice, result);
+    ASSERT_TRUE(writer) << qPrintable(result.text());
+    writer->writeSlice(0, {2, 1, 1, PrimitiveType::UInt16, QByteArray(4, 0)});
+    writer->writeSlice(1, {2, 1, 1, PrimitiveType::UInt16, QByteArray("\x64\0\xe8\x03", 4)});  // 100, 1000
+    ParamBundle parameters;
+    parameters.insert("BoundingBox", Parameter::ofReals({0, 2, 0, 4, 0, 1}));
+    parameters.insert("WindowCenter", Parameter::ofReals({500}));
+    parameters.insert("WindowWidth", Parameter::ofReals({200}));
+    writer->writeParameters(parameters);
+    ASSERT_TRUE(writer->finish().good());
+
+    const auto mesh = OrlanMesh::read(path, result);
+    ASSERT_TRUE(mesh) << qPrintable(result.text());
+    const auto info = KxVolumeInfo::readVolumeInfo(*mesh, 8, 8, 1, result);
+    ASSERT_TRUE(info) << qPrintable(result.text());
+    EXPECT_EQ(numbersOf(*info), (QVector<double>{100, 1000}));
+    EXPECT_EQ(info->lowestValue(), 400);
+    EXPECT_EQ(info->highestValue(), 600);
+    EXPECT_EQ(info->pixelAspectRatio(), 0.25F);
+    EXPECT_FALSE(KxVolumeInfo::readVolumeInfo(*mesh, 8, 8, 2, result));
+}
+
+}  // namespace
