@@ -1,0 +1,123 @@
+#include "platform/resources/ExResource.h"
+
+#include "platform/base/LogFile.h"
+
+#include <QFile>
+#include <QFileInfo>
+#include <QHash>
+#include <QSettings>
+#include <QStandardPaths>
+#include <QStringList>
+
+namespace Kdd
+{
+namespace
+{
+
+struct Setting
+{
+    const char* variable;
+    const char* key;  ///< in the file
+    const char* standard;
+};
+
+constexpr Setting kWebHost = {"KDD_WEB_HOST", "web/host", "localhost"};
+constexpr Setting kCloudDownload = {"KDD_CLOUD_DOWNLOAD", "cloud/download",
+                                    "https://storage-download.googleapis.com/"};
+constexpr Setting kCloudUpload = {"KDD_CLOUD_UPLOAD", "cloud/upload",
+                                  "https://storage-upload.googleapis.com/"};
+constexpr Setting kCloudApi = {"KDD_CLOUD_API", "cloud/api", "https://storage.googleapis.com/"};
+constexpr Setting kCloudToken = {"KDD_CLOUD_TOKEN", "cloud/token", "https://oauth2.googleapis.com/token"};
+constexpr Setting kDatabase = {"KDD_DATABASE", "database/address", ""};
+constexpr Setting kMetaFolder = {"KDD_META_FOLDER", "folders/meta", ""};
+constexpr Setting kFileCacheFolder = {"KDD_FILE_CACHE", "folders/filecache", ""};
+
+using Values = QHash<QString, QByteArray>;
+
+QString filePath()
+{
+    QString named = QFile::decodeName(qgetenv("KDD_CONFIG"));
+    if (!named.isEmpty())
+        return named;
+    return QStandardPaths::writableLocation(QStandardPaths::GenericConfigLocation) +
+           QLatin1String("/kdd/kdd.ini");
+}
+
+Values readFile()
+{
+    const QString path = filePath();
+    // Nobody has to have a file, but one that is named is meant to be there.
+    const bool isNamed = !qEnvironmentVariableIsEmpty("KDD_CONFIG");
+    if (!QFileInfo::exists(path) && !isNamed)
+        return {};
+    QSettings file(path, QSettings::IniFormat);
+    file.setIniCodec("UTF-8");
+    Values values;
+    const QStringList keys = file.allKeys();
+    // What looks like a list is a value with commas that nobody put in quotes.
+    for (const QString& key : keys)
+        values.insert(key, file.value(key).toStringList().join(QLatin1Char(',')).toUtf8());
+    if (file.status() != QSettings::NoError || !QFileInfo(path).isReadable())
+        LogFile::warnf("The settings in %s cannot be read", qUtf8Printable(path));
+    return values;
+}
+
+QByteArray valueOf(const Setting& setting)
+{
+    QByteArray fromEnvironment = qgetenv(setting.variable);
+    if (!fromEnvironment.isEmpty())
+        return fromEnvironment;
+    // A copy, because an object that reads settings must not be shared by threads.
+    static const Values fromFile = readFile();
+    return fromFile.value(QLatin1String(setting.key), setting.standard);
+}
+
+QByteArray endpoint(const Setting& setting)
+{
+    const QByteArray address = valueOf(setting);
+    return address.endsWith('/') ? address : address + '/';
+}
+
+}  // namespace
+
+QByteArray ExResource::getWebServiceHostExternal()
+{
+    return valueOf(kWebHost);
+}
+
+QByteArray ExResource::cloudDownloadEndpoint()
+{
+    return endpoint(kCloudDownload);
+}
+
+QByteArray ExResource::cloudUploadEndpoint()
+{
+    return endpoint(kCloudUpload);
+}
+
+QByteArray ExResource::cloudApiEndpoint()
+{
+    return endpoint(kCloudApi);
+}
+
+QByteArray ExResource::cloudTokenEndpoint()
+{
+    return valueOf(kCloudToken);
+}
+
+QByteArray ExResource::databaseAddress()
+{
+    return valueOf(kDatabase);
+}
+
+QByteArray ExResource::metaFolder()
+{
+    return valueOf(kMetaFolder);
+}
+
+QByteArray ExResource::fileCacheFolder()
+{
+    return valueOf(kFileCacheFolder);
+}
+
+}  // namespace Kdd

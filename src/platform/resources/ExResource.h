@@ -1,0 +1,48 @@
+#pragma once
+
+#include "platform/base/Export.h"
+
+#include <QByteArray>
+
+namespace Kdd
+{
+
+/// What differs from site to site. Each setting comes from its environment variable where that is set and not empty,
+/// else from the site's file, else it is what stands here.
+///
+/// The file is an INI file in UTF-8: the one that the environment variable KDD_CONFIG names, else kdd/kdd.ini in the
+/// user's configuration folder. It is read once, when the first setting is asked for; one that cannot be read is
+/// warned about. Values with a comma, semicolon or backslash stand in double quotes there.
+///
+/// May be used on any thread.
+class KDD_EXPORT ExResource
+{
+public:
+    /// Under which host, with a port if need be, the own web service is reached. KDD_WEB_HOST, web/host, "localhost".
+    static QByteArray getWebServiceHostExternal();
+
+    // The cloud storage's addresses, each with the "/" that the bucket follows.
+
+    /// Reads of objects. KDD_CLOUD_DOWNLOAD, cloud/download, the public download host.
+    static QByteArray cloudDownloadEndpoint();
+
+    /// Writes. KDD_CLOUD_UPLOAD, cloud/upload, the public upload host.
+    static QByteArray cloudUploadEndpoint();
+
+    /// All else. KDD_CLOUD_API, cloud/api, the public host.
+    static QByteArray cloudApiEndpoint();
+
+    /// Where access tokens come from when a key does not say so. KDD_CLOUD_TOKEN, cloud/token, the public address.
+    static QByteArray cloudTokenEndpoint();
+
+    /// Address of the image database. KDD_DATABASE, database/address, empty: none.
+    static QByteArray databaseAddress();
+
+    /// Folder of the tag files. KDD_META_FOLDER, folders/meta, empty: the image database knows it.
+    static QByteArray metaFolder();
+
+    /// Folder of the file cache. KDD_FILE_CACHE, folders/filecache, empty: there is no file cache.
+    static QByteArray fileCacheFolder();
+};
+
+}  // namespace Kdd
