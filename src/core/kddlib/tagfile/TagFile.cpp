@@ -7,6 +7,7 @@
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
 #include "platform/base/Stopwatch.h"
+#include "platform/database/StorageManager.h"
 
 #include <dcmtk/dcmdata/dcdeftag.h>
 #include <dcmtk/dcmdata/dcfilefo.h>
@@ -38,7 +39,7 @@ TagFile::~TagFile()
 const char* TagFile::metaFolder()
 {
     if (sMetaFolder.isEmpty())
-        setMetaFolder("");
+        setMetaFolder(Kxg::StorageManager::getMetaFolder().constData());
     return sMetaFolder.constData();
 }
 
@@ -246,14 +247,14 @@ void TagFile::deleteEmptyNodes()
 void TagFile::optimizeAll()
 {
     if (debugOption(kMeasureUnoptimised))
-        mUnoptimisedSize = serialized(CompressionMode::None).size();
+        mStatistics.unoptimisedSize = serialized(CompressionMode::None).size();
     const Stopwatch stopwatch;
     for (TagMap* series : qAsConst(mSeries))
         series->optimizeAll();
     for (const std::shared_ptr<TagMap>& study : qAsConst(mStudies))
         study->optimizeAll();
     deleteEmptyNodes();
-    mOptimiseMs = stopwatch.elapsed();
+    mStatistics.optimiseMs = stopwatch.elapsed();
 }
 
 void TagFile::clear()
@@ -261,13 +262,11 @@ void TagFile::clear()
     mSeries.clear();
     mImages.clear();
     mStudies.clear();
-    mStoredSize = 0;
-    mUncompressedSize = 0;
-    mUnoptimisedSize = 0;
-    mBlobBytes = 0;
-    mOptimiseMs = 0;
-    mNumVolumes = 0;
-    mNumBlobs = 0;
+    // The times of reading and writing tell of the file, not of what is held.
+    Statistics cleared;
+    cleared.readMs = mStatistics.readMs;
+    cleared.writeMs = mStatistics.writeMs;
+    mStatistics = cleared;
 }
 
 QByteArray TagFile::studyInstanceUID() const
@@ -282,8 +281,10 @@ std::shared_ptr<TagMap> TagFile::study() const
 
 TagFile::Statistics TagFile::statistics() const
 {
-    return {mSeries.size(), mImages.size(), mNumVolumes,       mNumBlobs,        mOptimiseMs, mReadMs,
-            mWriteMs,       mStoredSize,    mUncompressedSize, mUnoptimisedSize, mBlobBytes};
+    Statistics statistics = mStatistics;
+    statistics.series = mSeries.size();
+    statistics.images = mImages.size();
+    return statistics;
 }
 
 // NOLINTNEXTLINE(readability-function-size)
@@ -291,10 +292,11 @@ void TagFile::getStatistics(int& series, int& images, int& volumes, int& blobs, 
                             int& writeMs, int& storedSize, int& uncompressedSize, int& unoptimisedSize,
                             int& blobBytes) const
 {
+    const Statistics all = statistics();
     std::tie(series, images, volumes, blobs, optimiseMs, readMs, writeMs, storedSize, uncompressedSize,
              unoptimisedSize, blobBytes) =
-        std::make_tuple(mSeries.size(), mImages.size(), mNumVolumes, mNumBlobs, mOptimiseMs, mReadMs,
-                        mWriteMs, mStoredSize, mUncompressedSize, mUnoptimisedSize, mBlobBytes);
+        std::tie(all.series, all.images, all.volumes, all.blobs, all.optimiseMs, all.readMs, all.writeMs,
+                 all.storedSize, all.uncompressedSize, all.unoptimisedSize, all.blobBytes);
 }
 
 }  // namespace Kdd

@@ -5,18 +5,30 @@
 
 #include <QByteArray>
 #include <QFile>
+#include <QList>
 #include <QMap>
 #include <QString>
+#include <QVector>
 
 #include <memory>
+#include <string>
+#include <vector>
 
 class DcmDataset;
 class QDataStream;
+
+namespace Kxg
+{
+struct DicomDirectoryEntry;
+struct ImageFile;
+struct SeriesInfo;
+}  // namespace Kxg
 
 namespace Kdd
 {
 
 class TagMap;
+struct VolumeInfo;
 enum class Flush;
 
 /// One study's metadata cache: the tree study, series, image of `TagMap`s with indexes by UID, and its file.
@@ -164,6 +176,57 @@ public:
     /// images; on failure of the write it holds the whole study, so that nothing is lost and the call can be repeated.
     bool mergeIntoCacheFile();
 
+    // ---- volumes
+
+    /// Adds the volumes of one series, whose indexes are their places in `infos`. Images that are not held are warned
+    /// about and passed over; a volume none of whose images is held is not made.
+    void addVolumeInfo(const std::vector<VolumeInfo*>& infos);
+
+    /// Called when a study's volumes are complete; there is nothing left to do then.
+    void createVolumes();
+
+    // ---- previews
+
+    /// The images that get a preview of their own, by SOP Instance UID: those that no volume shows, all of a short
+    /// series, a representative one of a long series and of each special kind (ultrasound, captures, localizers).
+    void selectPreviewImages2D(QList<QByteArray>& uids) const;
+
+    /// Make and keep the preview of an image, and of a mammogram where the breast lies. False when the image is not
+    /// held, cannot be loaded or cannot be shown, which is logged with `path`.
+    bool addPreview(TagMap* image, DcmDataset* dataset, const QString& path);
+    bool addPreview(const QByteArray& sopInstanceUID, const QString& path);
+    bool addPreview(DcmDataset* dataset, const QString& path);
+
+    /// Writes every preview to a folder as "HASH_Series_N_Image_N.jpg" and "HASH_Series_N_Volume_N.jpg". A file that
+    /// cannot be written is warned about and passed over. How many were written.
+    int exportPreviews(const QString& folder) const;
+
+    // ---- the image database
+
+    /// Gives every image that `info` names its file path. Images not held are warned about, and `complete` becomes
+    /// false, or are made with `createMissing`. How many images received a path.
+    int addDicomFilePaths(TagMap* series, const Kxg::SeriesInfo* info, bool createMissing, bool& complete);
+
+    /// Gives the volume that a volume file's name stands for that name; `createMissing` makes the volume first. Other
+    /// entries change nothing.
+    void addVolumeFilePath(TagMap* series, const Kxg::DicomDirectoryEntry& entry, bool createMissing);
+
+    /// Marks the study as known to the database, and adds an empty series for each one that only the database has but
+    /// for reports, presentation states and segmentations. What the tree knows already stays as it is.
+    void copyDatabaseValuesIntoTagMap(const Kxg::DicomDirectoryEntry& study);
+
+    /// Gives every series a label (0006,7120) that no other series of the study has.
+    void createAbstractTags();
+
+    /// Reads the study's tag file and brings it into line with the image database, in memory only. `user` is for
+    /// databases that ask who asks; ours does not. False when the database does not know the study or the file cannot
+    /// be read.
+    bool readAndSync(const char* studyUID, const char* user);
+
+    /// Brings the tree into line with what the database says of the study: file paths, volume names, series that are
+    /// gone. Whether anything changed.
+    bool syncWithDatabase(const std::shared_ptr<Kxg::DicomDirectoryEntry>& study);
+
     /// Why the last read, write or merge failed, in words; empty after success.
     const QString& failure() const { return mFailure; }
 
@@ -193,6 +256,13 @@ private:
     void dropImage(TagMap* image);
     void dropStudyIfEmpty(TagMap* study);
 
+    TagMap* makeImage(TagMap* series, const QByteArray& sopUID);
+    TagMap* findImage(const Kxg::ImageFile& file) const;
+    bool syncSeries(TagMap& series, const Kxg::DicomDirectoryEntry& entry);
+    bool syncImages(TagMap& series, const Kxg::SeriesInfo& info);
+
+    QVector<TagMap*> imagesOf(const VolumeInfo& info, int volumeIndex) const;
+
     QByteArray serialized(CompressionMode mode);
     void recordSizes(qint64 storedBody, qint64 body, const QList<QByteArray>& blobs);
 
@@ -221,15 +291,7 @@ private:
     QString mFailure;
     bool mLockedOut = false;
 
-    int mStoredSize = 0;
-    int mUncompressedSize = 0;
-    int mUnoptimisedSize = 0;
-    int mBlobBytes = 0;
-    int mOptimiseMs = 0;
-    int mReadMs = 0;
-    int mWriteMs = 0;
-    int mNumVolumes = 0;
-    int mNumBlobs = 0;
+    Statistics mStatistics;  // but for series and images, which the indexes count
 
     static CompressionMode sCompressionMode;
     static Vec2i sPreviewSize;

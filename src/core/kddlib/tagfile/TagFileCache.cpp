@@ -63,11 +63,11 @@ bool TagFile::readCacheFile(const QString& path, const char* studyUID, bool keep
     const bool isRead = readCacheFile(in, studyUID);
     if (!isRead || !keepOpen)
         mCacheFile.close();
-    mReadMs = stopwatch.elapsed();
+    mStatistics.readMs = stopwatch.elapsed();
     if (!isRead)
         LogFile::errorf("Could not read %s", qUtf8Printable(path));
     else if (LogFile::debugLogging())
-        LogFile::printf("Cache file read in %d msec", mReadMs);
+        LogFile::printf("Cache file read in %d msec", mStatistics.readMs);
     return isRead;
 }
 
@@ -169,7 +169,7 @@ bool TagFile::writeInto(QFile& locked, const QString& path, bool cut)
     }
     mCacheFilePath = path;
     if (LogFile::debugLogging())
-        LogFile::printf("Written tag file %s in %d msec", qUtf8Printable(path), mWriteMs);
+        LogFile::printf("Written tag file %s in %d msec", qUtf8Printable(path), mStatistics.writeMs);
     return true;
 }
 

@@ -159,10 +159,10 @@ bool TagFile::writeCacheFile(QDataStream& out)
     KxMsg body;
     body.reserve(kBodyReservation);
     QList<QByteArray> blobs;
-    mNumVolumes = 0;
+    mStatistics.volumes = 0;
     for (const std::shared_ptr<TagMap>& study : qAsConst(mStudies)) {
         study->relinkItems();
-        mNumVolumes += writeStudy(body, *study, blobs);
+        mStatistics.volumes += writeStudy(body, *study, blobs);
     }
     if (body.size() > kMaxBodySize)
         return fail(QLatin1String(kTooLarge));
@@ -175,7 +175,7 @@ bool TagFile::writeCacheFile(QDataStream& out)
     for (const QByteArray& blob : qAsConst(blobs))
         out << blob;
     recordSizes(stored.size(), body.size(), blobs);
-    mWriteMs = stopwatch.elapsed();
+    mStatistics.writeMs = stopwatch.elapsed();
     return true;
 }
 
@@ -183,10 +183,10 @@ void TagFile::recordSizes(qint64 storedBody, qint64 body, const QList<QByteArray
 {
     const qint64 blobBytes = totalSize(blobs);
     const qint64 around = kFrameSize + qint64(kBlobFrameSize) * blobs.size() + blobBytes;
-    mNumBlobs = blobs.size();
-    mBlobBytes = asInt(blobBytes);
-    mStoredSize = asInt(storedBody + around);
-    mUncompressedSize = asInt(body + around);
+    mStatistics.blobs = blobs.size();
+    mStatistics.blobBytes = asInt(blobBytes);
+    mStatistics.storedSize = asInt(storedBody + around);
+    mStatistics.uncompressedSize = asInt(body + around);
 }
 
 /// Puts the records of a body into the indexes and the tree of a tag file.
@@ -275,7 +275,7 @@ private:
     bool takeVolumes(KxMsg& record)
     {
         mSeries->deserializeVolumes(record, mContext.blobs);
-        mFile.mNumVolumes += mSeries->volumes().size();
+        mFile.mStatistics.volumes += mSeries->volumes().size();
         return !record.failed();
     }
 

@@ -8,6 +8,8 @@
 #include <QDir>
 #include <QFileInfo>
 
+#include <algorithm>
+
 namespace Kdd
 {
 
@@ -17,6 +19,14 @@ namespace
 const char* const kCategory = "TagMerge";
 
 constexpr LockPolling kMergePolling{100, 20};
+
+const DcmTagKey kVolumeIndex(0x0006, 0x7103);
+const DcmTagKey kAbstract(0x0006, 0x7120);
+
+bool isLabelled(const TagMap* series)
+{
+    return series->findElement(kAbstract) != nullptr;
+}
 
 }  // namespace
 
@@ -87,9 +97,13 @@ void TagFile::mergeFresh(const Indexes& fresh)
 {
     TagMap& study = *mStudies.first();
     TagMap& freshStudy = *fresh.studies.first();
+    const bool hasLabels = std::any_of(fresh.series.cbegin(), fresh.series.cend(), isLabelled);
     for (auto it = fresh.series.cbegin(); it != fresh.series.cend(); ++it)
         mergeSeries(it.value(), it.key(), freshStudy, study);
     deleteEmptyNodes();
+    // Labels are distinct only among the series that were known when they were made.
+    if (hasLabels)
+        createAbstractTags();
     for (auto it = fresh.series.cbegin(); it != fresh.series.cend(); ++it) {
         if (TagMap* series = mSeries.value(it.key(), nullptr))
             series->optimizeAll();
@@ -97,14 +111,17 @@ void TagFile::mergeFresh(const Indexes& fresh)
     study.optimizeAll();
 }
 
-/// Joins a fresh series with the one of the same UID that the file holds. The fewer images are copied into the series
-/// of the more: a few images that arrive for a series of thousands cost little more than reading and writing the file.
+/// Joins a fresh series with the one of the same UID that the file holds. The series that has volumes stays, the fresh
+/// one if both have: its volumes were made from all that is known now. Without volumes the fewer images are copied into
+/// the series of the more: a few images that arrive for a series of thousands cost little more than reading and writing
+/// the file.
 void TagFile::mergeSeries(TagMap* series, const QByteArray& seriesUID, TagMap& freshStudy, TagMap& study)
 {
     for (TagMap* image : series->children())
         delete mImages.take(imageKey(*image));
     TagMap* old = mSeries.value(seriesUID, nullptr);
-    if (old != nullptr && old->children().size() > series->children().size()) {
+    if (old != nullptr && series->volumes().isEmpty() &&
+        (!old->volumes().isEmpty() || old->children().size() > series->children().size())) {
         copyImages(*series, *old);
         return;
     }
@@ -121,10 +138,12 @@ void TagFile::mergeSeries(TagMap* series, const QByteArray& seriesUID, TagMap& f
     study.addChildMap(series, TagMap::SeriesLevel);
 }
 
+/// Volumes do not come along: what an image says of those of its old series would name others in the new one.
 void TagFile::copyImages(const TagMap& from, TagMap& to)
 {
     for (const TagMap* image : from.children()) {
         TagMap* copy = image->clone();
+        copy->deleteElement(kVolumeIndex);
         mImages.insert(imageKey(*copy), copy);
         to.addChildMap(copy, TagMap::ImageLevel);
     }

@@ -200,6 +200,13 @@ public:
     /// Writes the node's own entries with lengths and attribute names; a missing marker shows as "--".
     void listContent(QTextStream& out, int indent) const;
 
+    // ---- previews
+
+    /// The JPEG that represents this node best: its own or its parent's, that of the volume with the most slices
+    /// below, or the first of an image. `owner`, if not null, receives the image it belongs to. Empty when there is
+    /// none.
+    QByteArray findPreviewData(TagMap** owner);
+
     // ---- volumes
 
     const QList<Volume*>& volumes() const { return mVolumes; }

@@ -2,6 +2,7 @@
 
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/RescaleSlopeCalculator.h"
+#include "kddlib/volumes/VolumeInfo.h"
 
 #include <QCryptographicHash>
 #include <QHash>
@@ -311,6 +312,20 @@ void Volume::setMultiFrameInfo(const std::vector<std::string>& frameIdentifiers)
         slices.append({indexes.value(before(identifier, dot), -1), frame});
     }
     setSlices(slices);
+}
+
+void Volume::setInfo(const VolumeInfo& info, const QVector<TagMap*>& images)
+{
+    mImages = images;
+    setMultiFrameInfo(info.frameIdentifiers);
+    setGeometry(info.dims, info.boundingBox, info.transformation);
+    mPreviewData = info.preview;
+    mFileNameSuffix = fileNameSuffix(info.name.constData());
+    setRescale(info.rescaleSlope, info.rescaleIntercept, info.precisionBitLoss);
+    setPadding(info.paddingValue, info.paddingRangeLimit);
+    mNumLossyCompressedImages = info.numLossyCompressedImages;
+    mNumOverlayPlanes = info.numOverlayPlanes;
+    mHistogram = info.histogram;
 }
 
 void Volume::attachImages(int volumeIndex, const QVector<TagMap*>& images)

@@ -17,7 +17,9 @@ namespace Kdd
 {
 
 class KxMsg;
+class TagFile;
 class TagMap;
+struct VolumeInfo;
 
 /// Which image of a volume holds a slice, and which of its frames.
 struct Slice
@@ -104,6 +106,11 @@ public:
 
     /// Takes out an image that leaves the tree. Its slices stay, with an unknown image.
     void forgetImage(const TagMap* image);
+
+    /// A copy inside `series`, with a copy of every image under a new SOP Instance UID, which are added to the tag
+    /// file; `series` must be one of its series. The slices, geometry, rescale slope and intercept and padding are
+    /// taken over, the rest is not. The copy belongs to `series`.
+    Volume* duplicate(TagFile& tagFile, TagMap& series) const;
 
     // ---- geometry
 
@@ -198,6 +205,9 @@ protected:
     /// one slice. Without identifiers there is one slice per image: the k-th slice is the image that was the
     /// k-th before sorting.
     void setMultiFrameInfo(const std::vector<std::string>& frameIdentifiers);
+
+    /// Takes over all that a volume file says; the images are those found of it, in the file's order.
+    void setInfo(const VolumeInfo& info, const QVector<TagMap*>& images);
 
     void setSlices(const QVector<Slice>& slices) { mSlices = SliceList(slices); }
 

@@ -1,0 +1,244 @@
+#include "kddlib/TagFileGenerator.h"
+
+#include "kddlib/Limits.h"
+#include "kddlib/net/DicomFileReader.h"
+#include "kddlib/previews/PreviewGenerator.h"
+#include "kddlib/previews/QuadrantNavigation.h"
+#include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagmodel/TagElement.h"
+#include "kddlib/tagmodel/TagMap.h"
+#include "kddlib/volumes/VolumeInfo.h"
+#include "platform/base/LogFile.h"
+#include "platform/database/Kxg.h"
+#include "platform/volumefile/OrlanMesh.h"
+
+#include <QMap>
+
+#include <dcmtk/dcmdata/dcfilefo.h>
+
+#include <map>
+
+namespace Kdd
+{
+
+namespace
+{
+
+const char* const kDefaultUser = "zp_administrator";
+
+const DcmTagKey kFilePath(0x0006, 0x7100);
+const DcmTagKey kHasVolumeFile(0x0006, 0x7108);
+
+const char* const kSeriesInstanceUID = "G0020-000E";
+const char* const kModality = "G0008-0060";
+const char* const kMammography = "MG";
+
+const char* userOrDefault(const char* user)
+{
+    return user != nullptr ? user : kDefaultUser;
+}
+
+}  // namespace
+
+/// The datasets of a study as they were loaded, for the previews that are chosen once all are known. A dataset costs a
+/// hundred times what its tag map costs, so of large studies only the first are kept; the others are loaded again when
+/// they are chosen.
+class TagFileGenerator::KeptDatasets
+{
+public:
+    void keep(const QByteArray& sopUID, std::unique_ptr<DcmDataset> dataset)
+    {
+        // Of several files of one image the last one counts.
+        mDatasets.erase(sopUID);
+        if (mDatasets.size() < kMaxDatasets)
+            mDatasets.emplace(sopUID, std::move(dataset));
+    }
+
+    /// Null when it is not kept.
+    DcmDataset* find(const QByteArray& sopUID) const
+    {
+        const auto it = mDatasets.find(sopUID);
+        return it != mDatasets.end() ? it->second.get() : nullptr;
+    }
+
+private:
+    static constexpr std::size_t kMaxDatasets = 500;
+
+    std::map<QByteArray, std::unique_ptr<DcmDataset>> mDatasets;
+};
+
+TagFileGenerator::TagFileGenerator()
+    : TagFileGenerator(nullptr, true)
+{
+}
+
+TagFileGenerator::TagFileGenerator(const char* user, bool optimize)
+    : mUser(userOrDefault(user))
+    , mOptimize(optimize)
+{
+}
+
+void TagFileGenerator::setOptions(const char* user, bool optimize)
+{
+    mUser = userOrDefault(user);
+    mOptimize = optimize;
+}
+
+void TagFileGenerator::getTimings(int& loadMs, int& volumeMs, int& previewMs) const
+{
+    loadMs = mLoadWatch.elapsed();
+    volumeMs = mVolumeWatch.elapsed();
+    previewMs = mPreviewWatch.elapsed();
+}
+
+bool TagFileGenerator::createTagFile(int studyId)
+{
+    TagFile tagFile;
+    return createTagFile(tagFile, studyId, nullptr);
+}
+
+bool TagFileGenerator::createTagFile(TagFile& tagFile, int studyId, const char* studyInstanceUID)
+{
+    mLoadWatch = mVolumeWatch = mPreviewWatch = {};
+    tagFile.clear();
+    std::vector<std::string> dicomFiles;
+    std::vector<std::string> volumeFiles;
+    std::vector<std::string> seriesWithVolumeFile;
+    const Result query =
+        Kxg::GetAllFilesOfStudy(mUser, studyId, dicomFiles, volumeFiles, seriesWithVolumeFile);
+    if (query.bad()) {
+        LogFile::errorf("Database query GetAllFilesOfStudy() failed.");
+        LogFile::errorf("%s", qUtf8Printable(query.text()));
+        return false;
+    }
+    KeptDatasets datasets;
+    for (const std::string& path : dicomFiles)
+        addDicomFile(tagFile, path, studyInstanceUID, datasets);
+    addVolumeInfo(tagFile, volumeFiles);
+    QList<QByteArray> chosen;
+    tagFile.selectPreviewImages2D(chosen);
+    addPreviews(tagFile, chosen, datasets);
+    finishTree(tagFile);
+    for (const std::string& uid : seriesWithVolumeFile) {
+        if (TagMap* series = tagFile.findSeries(QByteArray::fromStdString(uid)))
+            series->putAndInsertInt(kHasVolumeFile, 1);
+    }
+    return tagFile.writeCacheFile();
+}
+
+void TagFileGenerator::completeArrivals(TagFile& arrivals)
+{
+    mLoadWatch = mVolumeWatch = mPreviewWatch = {};
+    QList<QByteArray> chosen;
+    TagFile whole;
+    if (whole.readCacheFileForStudy(arrivals.studyInstanceUID().constData(), false)) {
+        for (const TagMap* image : arrivals.imagesByUID())
+            whole.addTagMap(image->clone(), nullptr, true);
+        whole.selectPreviewImages2D(chosen);
+    } else {
+        arrivals.selectPreviewImages2D(chosen);
+    }
+    addPreviews(arrivals, chosen, KeptDatasets());
+    finishTree(arrivals);
+}
+
+void TagFileGenerator::finishTree(TagFile& tagFile) const
+{
+    tagFile.createAbstractTags();
+    if (mOptimize)
+        tagFile.optimizeAll();
+}
+
+void TagFileGenerator::addDicomFile(TagFile& tagFile, const std::string& path, const char* studyInstanceUID,
+                                    KeptDatasets& datasets)
+{
+    const StopwatchSum::Running running(mLoadWatch);
+    DcmFileFormat file;
+    const OFCondition condition = readDicomFile(path.c_str(), file);
+    if (condition.bad()) {
+        LogFile::errorf("Could not open %s: %s", path.c_str(), condition.text());
+        return;
+    }
+    std::unique_ptr<TagMap> map(TagMap::createTagMap(file.getDataset(), kDefaultValueBound));
+    const bool isForeign =
+        studyInstanceUID != nullptr && tagFile.isEmpty() && map->uid(TagMap::StudyLevel) != studyInstanceUID;
+    const int before = tagFile.imagesByUID().size();
+    TagMap* image = isForeign ? nullptr : tagFile.addTagMap(map.release(), path.c_str(), true);
+    if (image == nullptr) {
+        LogFile::warnf("File %s does not belong to study %s", path.c_str(),
+                       studyInstanceUID != nullptr ? studyInstanceUID
+                                                   : tagFile.studyInstanceUID().constData());
+        return;
+    }
+    if (tagFile.imagesByUID().size() == before)
+        LogFile::warnf("%s replaces another file of the same SOP Instance UID", path.c_str());
+    // Who reads the tag file finds the image without asking the database; a sync keeps the path up to date.
+    image->putAndInsertValue(kFilePath, VrCode::LO, QByteArray::fromStdString(path));
+    datasets.keep(image->uid(TagMap::ImageLevel), std::unique_ptr<DcmDataset>(file.getAndRemoveDataset()));
+}
+
+/// Of the images chosen those that are held.
+void TagFileGenerator::addPreviews(TagFile& tagFile, const QList<QByteArray>& chosen,
+                                   const KeptDatasets& datasets)
+{
+    const StopwatchSum::Running running(mPreviewWatch);
+    for (const QByteArray& sopUID : chosen) {
+        TagMap* image = tagFile.findImage(sopUID);
+        if (image == nullptr)
+            continue;
+        QByteArray path;
+        image->findAndGetString(kFilePath, path);
+        DcmFileFormat reloaded;
+        DcmDataset* dataset = datasets.find(sopUID);
+        if (dataset == nullptr && readDicomFile(path.constData(), reloaded).good())
+            dataset = reloaded.getDataset();
+        tagFile.addPreview(image, dataset, QString::fromLocal8Bit(path));
+    }
+}
+
+void TagFileGenerator::addVolumeInfo(TagFile& tagFile, const std::vector<std::string>& volumeFiles)
+{
+    QMap<QByteArray, std::vector<VolumeInfo*>> infosBySeries;
+    for (const std::string& path : volumeFiles) {
+        QByteArray seriesUID;
+        if (VolumeInfo* info = createVolumeInfo(path.c_str(), seriesUID))
+            infosBySeries[seriesUID].push_back(info);
+    }
+    for (const std::vector<VolumeInfo*>& infos : qAsConst(infosBySeries)) {
+        tagFile.addVolumeInfo(infos);
+        qDeleteAll(infos);
+    }
+}
+
+VolumeInfo* TagFileGenerator::createVolumeInfo(const char* path, QByteArray& seriesInstanceUID)
+{
+    const StopwatchSum::Running running(mVolumeWatch);
+    Result result;
+    const std::unique_ptr<OrlanMesh> mesh = OrlanMesh::read(QByteArray(path), result);
+    if (mesh == nullptr) {
+        LogFile::errorf("%s", qUtf8Printable(result.text()));
+        return nullptr;
+    }
+    auto info = std::make_unique<VolumeInfo>();
+    seriesInstanceUID = dicomValue(*mesh, kSeriesInstanceUID);
+    if (!info->readHeader(*mesh, path))
+        return nullptr;
+    addPreview(*mesh, path, *info);
+    return info.release();
+}
+
+void TagFileGenerator::addPreview(OrlanMesh& mesh, const char* path, VolumeInfo& info)
+{
+    const StopwatchSum::Running running(mPreviewWatch);
+    const Vec2i size = TagFile::previewSize();
+    const QImage image = PreviewGenerator::createPreviewImage(
+        &mesh, path, static_cast<unsigned long>(size.x), static_cast<unsigned long>(size.y), info.dims.z / 2);
+    if (image.isNull())
+        return;
+    info.preview = PreviewGenerator::createPreviewData(image);
+    if (dicomValue(mesh, kModality) == kMammography)
+        info.quadrantData = QuadrantNavigation::computeImageBoxAndCenter(
+            image, QuadrantNavigation::checkOrientation(mesh.parameters().bundle("DICOM")));
+}
+
+}  // namespace Kdd

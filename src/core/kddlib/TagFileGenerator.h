@@ -1,0 +1,79 @@
+#pragma once
+
+#include "platform/base/Export.h"
+#include "platform/base/Stopwatch.h"
+
+#include <QByteArray>
+#include <QList>
+
+#include <memory>
+#include <string>
+#include <vector>
+
+namespace Kdd
+{
+
+class OrlanMesh;
+class TagFile;
+struct VolumeInfo;
+
+/// Builds the complete tag file of a study: images, volumes and previews, from the files that the image database lists
+/// for it (`Kxg::SetDatabaseServer`).
+///
+/// A file that cannot be read is logged and left out, and the study is built from the others. What comes out depends on
+/// the files and their paths only, not on the database's engine or on the order in which they were registered.
+///
+/// One generator builds one study at a time; several may work on several threads.
+class KDD_EXPORT TagFileGenerator
+{
+public:
+    /// As user "zp_administrator", optimising.
+    TagFileGenerator();
+
+    /// `user` is in whose name the database is asked; null stands for "zp_administrator". `optimize` places every
+    /// attribute where it costs the fewest bytes before the file is written.
+    TagFileGenerator(const char* user, bool optimize);
+
+    void setOptions(const char* user, bool optimize);
+
+    /// Builds the study of that number into `tagFile`, in place of what it holds, and writes its cache file. With
+    /// `studyInstanceUID` not null, files before the first image that belong to another study are warned about and
+    /// left out. False when the database cannot be asked or the file cannot be written; `tagFile` then keeps what was
+    /// built.
+    bool createTagFile(TagFile& tagFile, int studyId, const char* studyInstanceUID);
+
+    /// The same on a tag file of its own.
+    bool createTagFile(int studyId);
+
+    /// Prepares images that have just arrived (with their file paths in (0006,7100)) for being merged into the study's
+    /// cache file: makes the previews that the study will want once they are part of it, labels and optimises.
+    void completeArrivals(TagFile& arrivals);
+
+    /// What loading DICOM files, reading volume files and making previews took in the last build [ms].
+    void getTimings(int& loadMs, int& volumeMs, int& previewMs) const;
+
+protected:
+    /// Adds the volumes of the files to their series, in the order of the files.
+    void addVolumeInfo(TagFile& tagFile, const std::vector<std::string>& volumeFiles);
+
+    /// What a volume file says, and the series it belongs to; null when it cannot be used, which is logged. The caller
+    /// owns it.
+    VolumeInfo* createVolumeInfo(const char* path, QByteArray& seriesInstanceUID);
+
+private:
+    class KeptDatasets;
+
+    void addDicomFile(TagFile& tagFile, const std::string& path, const char* studyInstanceUID,
+                      KeptDatasets& datasets);
+    void addPreviews(TagFile& tagFile, const QList<QByteArray>& chosen, const KeptDatasets& datasets);
+    void addPreview(OrlanMesh& mesh, const char* path, VolumeInfo& info);
+    void finishTree(TagFile& tagFile) const;
+
+    QByteArray mUser;
+    bool mOptimize = true;
+    StopwatchSum mLoadWatch;
+    StopwatchSum mVolumeWatch;
+    StopwatchSum mPreviewWatch;
+};
+
+}  // namespace Kdd

@@ -1,0 +1,120 @@
+#include "kddlib/previews/QuadrantNavigation.h"
+#include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagmodel/TagElement.h"
+#include "kddlib/tagmodel/TagMap.h"
+#include "kddlib/volumes/Volume.h"
+#include "kddlib/volumes/VolumeInfo.h"
+#include "platform/base/CreateUIDs.h"
+#include "platform/base/LogFile.h"
+
+#include <dcmtk/dcmdata/dcdeftag.h>
+
+#include <memory>
+
+namespace Kdd
+{
+
+namespace
+{
+
+const char* const kCategory = "TagFile";
+
+const DcmTagKey kVolumeIndex(0x0006, 0x7103);
+
+/// Names the volume in one of its images: the index as one byte, further volumes appended as one byte each.
+void addVolumeIndex(TagMap& image, int index)
+{
+    const TagElement* held = image.findElement(kVolumeIndex);
+    if (held == nullptr) {
+        image.putAndInsertInt(kVolumeIndex, index);
+    } else if (held->vr() == VrCode::OB) {
+        QByteArray indexes = held->value();
+        indexes.append(static_cast<char>(index));
+        image.putAndInsertValue(kVolumeIndex, VrCode::OB, indexes);
+    }
+}
+
+/// What a copied image takes over from the series that it becomes part of.
+const DcmTagKey kSeriesIdentity[] = {DCM_StudyInstanceUID,  DCM_SeriesInstanceUID, DCM_SeriesNumber,
+                                     DCM_SeriesDescription, DCM_SeriesDate,        DCM_SeriesTime};
+
+TagMap* copyInto(const TagMap& series, const TagMap& image, int volumeIndex)
+{
+    std::unique_ptr<TagMap> copy(image.clone());
+    for (const DcmTagKey& key : kSeriesIdentity) {
+        QByteArray text;
+        if (series.findAndGetString(key, text))
+            copy->putAndInsertString(key, text);
+    }
+    copy->putAndInsertString(DCM_SOPInstanceUID, CreateUIDs::createUID(CreateUIDs::Instance));
+    copy->putAndInsertInt(kVolumeIndex, volumeIndex);
+    return copy.release();
+}
+
+}  // namespace
+
+void TagFile::addVolumeInfo(const std::vector<VolumeInfo*>& infos)
+{
+    TagMap* series = nullptr;
+    int index = -1;
+    for (const VolumeInfo* info : infos) {
+        ++index;
+        const QVector<TagMap*> images = imagesOf(*info, index);
+        if (images.isEmpty())
+            continue;
+        series = images.first()->parent();
+        auto* volume = new Volume(index);
+        volume->setInfo(*info, images);
+        series->addBareVolume(volume);
+    }
+    if (series != nullptr)
+        series->optimize(kVolumeIndex);
+}
+
+/// The images of a volume, each told that it belongs to it.
+QVector<TagMap*> TagFile::imagesOf(const VolumeInfo& info, int volumeIndex) const
+{
+    QVector<TagMap*> images;
+    images.reserve(static_cast<int>(info.imageUIDs.size()));
+    for (const std::string& uid : info.imageUIDs) {
+        TagMap* image = findImage(QByteArray::fromStdString(uid));
+        if (image == nullptr || image->parent() == nullptr) {
+            LogFile::tracef(2, kCategory, "3D volume %s contains unknown image %s", info.name.constData(),
+                            uid.c_str());
+            continue;
+        }
+        images.append(image);
+        addVolumeIndex(*image, volumeIndex);
+        if (info.quadrantData.size() >= QuadrantNavigation::kNumValues)
+            QuadrantNavigation::store(info.quadrantData, *image);
+    }
+    return images;
+}
+
+void TagFile::createVolumes()
+{
+    // Volumes come from volume files alone; nothing is left to be made from the images.
+}
+
+Volume* Volume::duplicate(TagFile& tagFile, TagMap& series) const
+{
+    auto* copy = new Volume;
+    series.addBareVolume(copy);
+    copy->mSlices = mSlices;
+    copy->setGeometry(mDims, mBoundingBox, mTransformation);
+    copy->mRescaleSlope = mRescaleSlope;
+    copy->mRescaleIntercept = mRescaleIntercept;
+    copy->setPadding(mPaddingValue, mPaddingRangeLimit);
+    copy->mImages.reserve(mImages.size());
+    for (const TagMap* image : mImages) {
+        TagMap* placed = tagFile.addTagMap(copyInto(series, *image, copy->mVolumeIndex), nullptr, false);
+        if (placed != nullptr)
+            copy->mImages.append(placed);
+    }
+    series.optimizeAll();
+    if (series.parent() != nullptr)
+        series.parent()->optimizeAll();
+    return copy;
+}
+
+}  // namespace Kdd

@@ -1,0 +1,46 @@
+#pragma once
+
+#include <QByteArray>
+#include <QVector>
+
+#include <dcmtk/config/osconfig.h>
+
+#include <dcmtk/dcmdata/dctagkey.h>
+
+namespace Kdd
+{
+
+class TagMap;
+
+/// The attributes of one frame of an image, wherever the image keeps them: enhanced images have functional groups, one
+/// set for each frame and one that all frames share; any other image has the attributes itself.
+///
+/// Points into the image, which must outlive it and stay unchanged.
+class FrameTags
+{
+public:
+    /// `frame` is 0-based.
+    FrameTags(const TagMap& image, int frame);
+
+    /// The text of an attribute in a functional group: of the frame, else of the shared ones, else of the image itself.
+    /// Empty when absent.
+    QByteArray text(const DcmTagKey& group, const DcmTagKey& key) const;
+
+    /// An attribute that only the image itself can have.
+    QByteArray text(const DcmTagKey& key) const;
+
+    const TagMap& image() const { return *mImage; }
+
+    /// How many frames have functional groups of their own.
+    static int numFrameGroups(const TagMap& image);
+
+private:
+    const TagMap* mImage;
+    const TagMap* mOwnGroups;
+    const TagMap* mSharedGroups;
+};
+
+/// The numbers of a multi-valued text; none when one of them is no number or not finite.
+QVector<double> numbersOf(const QByteArray& text);
+
+}  // namespace Kdd

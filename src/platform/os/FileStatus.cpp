@@ -1,0 +1,19 @@
+#include "platform/os/FileStatus.h"
+
+#include <sys/stat.h>
+
+namespace Kdd
+{
+
+bool statusOf(const char* path, FileStatus& status)
+{
+    struct stat found = {};
+    if (stat(path, &found) != 0)
+        return false;
+    constexpr qint64 kNanosecondsPerSecond = 1000000000;
+    status.size = found.st_size;
+    status.modified = found.st_mtim.tv_sec * kNanosecondsPerSecond + found.st_mtim.tv_nsec;
+    return true;
+}
+
+}  // namespace Kdd

@@ -1,0 +1,248 @@
+#include "kddlib/TagFileGenerator.h"
+
+#include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagmodel/TagElement.h"
+#include "kddlib/tagmodel/TagMap.h"
+#include "kddlib/volumes/Volume.h"
+#include "platform/database/Catalogue.h"
+#include "platform/database/Kxg.h"
+#include "platform/volumefile/OrlanMeshWriter.h"
+#include "platform/volumefile/SOPInstanceUtility.h"
+#include "support/DatasetBuilder.h"
+#include "support/LogCapture.h"
+#include "support/TemporaryStore.h"
+
+#include <QFile>
+#include <QImage>
+
+#include <gtest/gtest.h>
+
+namespace Kdd
+{
+namespace
+{
+
+const DcmTagKey kFilePath(0x0006, 0x7100);
+const DcmTagKey kPreview(0x0006, 0x7105);
+const DcmTagKey kHasVolumeFile(0x0006, 0x7108);
+
+constexpr int kSize = 32;  // of every picture [pixels]
+
+/// An archive of files in a folder of its own, registered in a database there.
+class GeneratorTest : public testing::Test
+{
+protected:
+    GeneratorTest()
+    {
+        Kxg::SetDatabaseServer("sqlite:" + mStore.filePath("database").toLocal8Bit());
+        Result result;
+        database = Kxg::Catalogue::open(Kxg::DatabaseServer(), result);
+        EXPECT_TRUE(result.good()) << qPrintable(result.text());
+    }
+
+    QByteArray path(const QByteArray& name) const { return mStore.folder().toLocal8Bit() + '/' + name; }
+
+    /// A square image whose right half is bright.
+    static DatasetBuilder aPicture(const char* sopUID, const char* number)
+    {
+        DatasetBuilder image = anImage(sopUID);
+        const std::pair<DcmTagKey, Uint16> words[] = {
+            {DCM_SamplesPerPixel, 1}, {DCM_Rows, kSize}, {DCM_Columns, kSize},         {DCM_BitsAllocated, 8},
+            {DCM_BitsStored, 8},      {DCM_HighBit, 7},  {DCM_PixelRepresentation, 0},
+        };
+        for (const auto& word : words)
+            image.dataset().putAndInsertUint16(word.first, word.second);
+        const QByteArray pixels = halfBright();
+        image.dataset().putAndInsertUint8Array(DCM_PixelData,
+                                               reinterpret_cast<const Uint8*>(pixels.constData()),
+                                               static_cast<unsigned long>(pixels.size()));
+        return image.with(DCM_SOPClassUID, UID_CTImageStorage)
+            .with(DCM_PhotometricInterpretation, "MONOCHROME2")
+            .with(DCM_InstanceNumber, number);
+    }
+
+    static QByteArray halfBright()
+    {
+        QByteArray pixels(kSize * kSize, '\0');
+        for (int i = 0; i < pixels.size(); ++i)
+            pixels[i] = i % kSize < kSize / 2 ? '\x10' : '\xf0';
+        return pixels;
+    }
+
+    /// Writes the file and has it registered, as part of the study that its dataset names or of another.
+    void addFile(const DatasetBuilder& image, const QByteArray& name, const QByteArray& studyUID = "1.2")
+    {
+        DcmFileFormat file(&image.dataset());
+        ASSERT_TRUE(file.saveFile(path(name).constData(), EXS_LittleEndianExplicit).good());
+        Kxg::DicomFileRecord record;
+        record.path = path(name);
+        record.studyInstanceUID = studyUID;
+        record.seriesInstanceUID = "1.2.3";
+        record.sopInstanceUID = name;
+        registerFiles({{record}, {}, {}});
+    }
+
+    /// A volume file of the images named, one slice each, whose slices are like `aPicture`.
+    void addVolume(const QByteArray& name, const std::vector<std::string>& sopUIDs,
+                   const QMap<QByteArray, QByteArray>& attributes = {})
+    {
+        Result result;
+        const int slices = qMax(1, static_cast<int>(sopUIDs.size()));
+        const Lattice lattice{"Level0", {kSize, kSize, slices}, PrimitiveType::UInt8, 1};
+        const auto writer = OrlanMeshWriter::create(path(name), lattice, result);
+        ASSERT_NE(writer, nullptr) << qPrintable(result.text());
+        const TypedData2D pixels{kSize, kSize, 1, PrimitiveType::UInt8, halfBright()};
+        for (int z = 0; z < slices; ++z)
+            ASSERT_TRUE(writer->writeSlice(z, pixels).good());
+        ParamBundle dicom;
+        dicom.insert("G0020-000E", Parameter::ofText("UI:1.2.3"));
+        for (auto it = attributes.cbegin(); it != attributes.cend(); ++it)
+            dicom.insert(it.key(), Parameter::ofText(it.value()));
+        ParamBundle parameters;
+        parameters.insertBundle("DICOM", dicom);
+        parameters.insertBundle("SOPInstanceUIDs", SOPInstanceUtility::bundleOf(sopUIDs));
+        parameters.insert("BoundingBox", Parameter::ofReals({0, 31, 0, 31, -5, 5}));
+        parameters.insert("PaddingValue", Parameter::ofIntegers({7}));
+        parameters.insert("PaddingRangeMin", Parameter::ofIntegers({1}));
+        parameters.insert("PaddingRangeMax", Parameter::ofIntegers({2}));
+        ASSERT_TRUE(writer->writeParameters(parameters).good());
+        ASSERT_TRUE(writer->finish().good());
+        registerFiles({{}, {{path(name), {}, "1.2", "1.2.3"}}, {}});
+    }
+
+    void registerFiles(const Kxg::FileRecords& files)
+    {
+        QMap<QByteArray, qint64> requests;
+        const Result result = database->registerFiles(files, requests);
+        ASSERT_TRUE(result.good()) << qPrintable(result.text());
+    }
+
+    bool build(TagFile& file, const char* studyUID = "1.2")
+    {
+        std::vector<Kxg::StudySummary> studies;
+        EXPECT_TRUE(database->listStudies(studies).good());
+        return !studies.empty() && TagFileGenerator().createTagFile(file, studies.front().id, studyUID);
+    }
+
+    static int valueOf(const TagMap* node, const DcmTagKey& key)
+    {
+        int value = -1;
+        node->findAndGetInt(key, value);
+        return value;
+    }
+
+    TemporaryStore mStore;
+    std::unique_ptr<Kxg::Catalogue> database;
+};
+
+TEST_F(GeneratorTest, ImagesVolumesAndPreviewsBecomeOneFile)
+{
+    for (const char* uid : {"1", "2", "3", "4"})
+        addFile(aPicture(uid, uid), uid);
+    addVolume("1.2.3-volume.vol", {"1", "2", "3"});
+    TagFile built;
+    ASSERT_TRUE(build(built));
+    TagFile file;
+    ASSERT_TRUE(file.readCacheFileForStudy("1.2", false));
+    EXPECT_EQ(file.imagesByUID().size(), 4);
+    const TagMap* series = file.seriesByUID().first();
+    EXPECT_EQ(valueOf(series, kHasVolumeFile), 1);
+    ASSERT_EQ(series->volumes().size(), 1);
+    const Volume& volume = *series->volumes().first();
+    EXPECT_EQ(volume.sopUIDList(), (std::vector<std::string>{"1", "2", "3"}));
+    EXPECT_EQ(volume.dims().z, 3);
+    EXPECT_EQ(QImage::fromData(volume.previewData()).size(), QSize(kSize, kSize));
+    EXPECT_EQ(file.findImage("1")->findElement(kPreview), nullptr) << "its volume shows it";
+    const TagElement* preview = file.findImage("4")->findElement(kPreview);
+    ASSERT_NE(preview, nullptr);
+    const QImage picture = QImage::fromData(preview->value());
+    EXPECT_LT(qGray(picture.pixel(2, 16)), 30);
+    EXPECT_GT(qGray(picture.pixel(29, 16)), 220);
+    QByteArray held;
+    EXPECT_TRUE(file.findImage("4")->findAndGetString(kFilePath, held));
+    EXPECT_EQ(held, path("4"));
+}
+
+TEST_F(GeneratorTest, WhatCannotBeUsedIsNamedAndLeftOut)
+{
+    addFile(anImage("foreign").inStudy("1.9"), "a-foreign");
+    for (const char* name : {"b", "c", "d"})
+        addFile(anImage(name), name);
+    QFile::remove(QString::fromLocal8Bit(path("c")));
+    addVolume("damaged.vol", {"b"});
+    ASSERT_TRUE(QFile(QString::fromLocal8Bit(path("damaged.vol"))).resize(500));
+    addVolume("nameless.vol", {});
+    const LogCapture log;
+    TagFile file;
+    ASSERT_TRUE(build(file));
+    EXPECT_EQ(file.imagesByUID().keys(), (QList<QByteArray>{"b", "d"}));
+    EXPECT_EQ(log.count("File " + path("a-foreign").toStdString() + " does not belong to study 1.2"), 1);
+    EXPECT_EQ(log.count("Could not open " + path("c").toStdString() + ": "), 1);
+    EXPECT_EQ(log.count("damaged.vol"), 1);
+    EXPECT_EQ(log.count("Could not get SOP list for 3D volume " + path("nameless.vol").toStdString()), 1);
+}
+
+TEST_F(GeneratorTest, AVolumeOfFramesNamesEachImageOnce)
+{
+    addFile(anImage("8"), "8");
+    addFile(anImage("9"), "9");
+    addVolume("frames.vol", {"8.0", "8.1", "9.0"}, {{"G0028-0008", "IS:2"}});
+    TagFile file;
+    ASSERT_TRUE(build(file));
+    const QList<Volume*>& volumes = file.seriesByUID().first()->volumes();
+    ASSERT_EQ(volumes.size(), 1);
+    EXPECT_EQ(volumes.first()->numImages(), 2);
+    EXPECT_EQ(volumes.first()->sopUIDList(), (std::vector<std::string>{"8.0", "8.1", "9.0"}));
+    EXPECT_EQ(volumes.first()->paddingValue().value_or(0), 1);
+    EXPECT_EQ(volumes.first()->paddingRangeLimit().value_or(0), 2);
+}
+
+TEST_F(GeneratorTest, OnlyMammogramsAreNavigated)
+{
+    addFile(anImage("8"), "8");
+    addFile(anImage("9"), "9");
+    addVolume("a.vol", {"8"}, {{"G0008-0060", "CS:MG "}});
+    addVolume("b.vol", {"9"}, {{"G0008-0060", "CS:MG"}});
+    TagFile file;
+    ASSERT_TRUE(build(file));
+    const DcmTag quadrants(0x0071, 0x0070, "Korvex");
+    EXPECT_EQ(file.findImage("8")->findElement(quadrants), nullptr);
+    EXPECT_NE(file.findImage("9")->findElement(quadrants), nullptr);
+}
+
+TEST_F(GeneratorTest, ADatabaseThatCannotAnswerFailsTheBuild)
+{
+    const LogCapture log;
+    TagFile file;
+    EXPECT_FALSE(TagFileGenerator().createTagFile(file, 12345, nullptr));
+    EXPECT_EQ(log.count("Database query GetAllFilesOfStudy() failed."), 1);
+}
+
+TEST_F(GeneratorTest, ArrivalsGetThePreviewsThatTheWholeStudyWants)
+{
+    const QByteArray numbers[] = {"10", "11", "12", "13", "14", "15", "16", "17", "18", "19", "20"};
+    TagFile arrivals;
+    for (const QByteArray& number : numbers) {
+        addFile(aPicture(number.constData(), number.constData()), number);
+        arrivals.addDicomFile(path(number).constData(), path(number).constData(), true)
+            ->putAndInsertValue(kFilePath, VrCode::LO, path(number));
+    }
+    TagFileGenerator().completeArrivals(arrivals);
+    EXPECT_NE(arrivals.findImage("10")->findElement(kPreview), nullptr) << "a short series shows all";
+    ASSERT_TRUE(arrivals.mergeIntoCacheFile());
+    TagFile more;
+    for (const QByteArray& number : numbers) {
+        const QByteArray next = number + "00";
+        addFile(aPicture(next.constData(), next.constData()), next);
+        more.addDicomFile(path(next).constData(), path(next).constData(), true)
+            ->putAndInsertValue(kFilePath, VrCode::LO, path(next));
+    }
+    TagFileGenerator().completeArrivals(more);
+    int previews = 0;
+    for (const TagMap* image : more.imagesByUID())
+        previews += image->findElement(kPreview) != nullptr ? 1 : 0;
+    EXPECT_EQ(previews, 1) << "of 22 the one in the middle";
+}
+
+}  // namespace
+}  // namespace Kdd

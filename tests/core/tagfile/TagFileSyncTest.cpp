@@ -1,0 +1,178 @@
+#include "TagFileFixture.h"
+#include "kddlib/volumes/Volume.h"
+#include "platform/database/DirectoryEntry.h"
+
+namespace Kdd
+{
+namespace
+{
+
+using Entry = Kxg::DicomDirectoryEntry;
+
+const DcmTagKey kAbstract(0x0006, 0x7120);
+
+/// What the database says, and two series "1.2.3" (images 1 and 2) and "1.2.4" (image 3) in the tag file.
+class TagFileSyncTest : public TagFileTest
+{
+protected:
+    TagFileSyncTest()
+    {
+        add(file, anImage("1"), "/old/1");
+        add(file, anImage("2"), "/old/2");
+        add(file, anImage("3").inSeries("1.2.4"), "/old/3");
+        study->studyInstanceUID = "1.2";
+    }
+
+    Entry& listSeries(const char* uid, const std::vector<Kxg::ImageFile>& images)
+    {
+        Entry series;
+        series.type = Entry::SeriesEntry;
+        series.seriesInstanceUID = uid;
+        series.modality = "CT";
+        series.seriesInfo = std::make_shared<Kxg::SeriesInfo>();
+        series.seriesInfo->images = images;
+        study->entries.push_back(series);
+        return study->entries.back();
+    }
+
+    static Entry volumeFile(const char* name)
+    {
+        Entry entry;
+        entry.type = Entry::VolumeFile;
+        entry.flags = Entry::HasVolume;
+        entry.name = name;
+        return entry;
+    }
+
+    static QByteArray textOf(const TagMap* node, const DcmTagKey& key)
+    {
+        QByteArray text;
+        node->findAndGetString(key, text);
+        return text;
+    }
+
+    TagFile file;
+    std::shared_ptr<Entry> study = std::make_shared<Entry>();
+};
+
+TEST_F(TagFileSyncTest, TheTreeBecomesWhatTheDatabaseLists)
+{
+    const LogCapture log;
+    listSeries("1.2.3", {{"2", "D:\\store\\2.dcm"}, {"9", "/new/9"}});
+    listSeries("1.2.7", {});
+    EXPECT_TRUE(file.syncWithDatabase(study));
+    EXPECT_EQ(file.imagesByUID().keys(), Uids{"2"});
+    EXPECT_EQ(textOf(file.findImage("2"), kFilePath), "D:/store/2.dcm");
+    EXPECT_EQ(textOf(file.findImage("2"), DCM_PatientName),
+              textOf(&*std::unique_ptr<TagMap>(anImage("2").map()), DCM_PatientName));
+    EXPECT_EQ(file.seriesByUID().keys(), (Uids{"1.2.3", "1.2.7"}));
+    EXPECT_EQ(log.count("Image 9 not found in tag map"), 1);
+    EXPECT_EQ(log.count("Series 1.2.7 not found in tag map"), 1);
+    EXPECT_FALSE(file.syncWithDatabase(study)) << "nothing changes any more";
+}
+
+TEST_F(TagFileSyncTest, ADatabaseThatSaysNothingRemovesNothing)
+{
+    EXPECT_FALSE(file.syncWithDatabase(nullptr));
+    EXPECT_FALSE(file.syncWithDatabase(study)) << "a study without series";
+    listSeries("1.2.3", {}).seriesInfo = nullptr;
+    listSeries("1.2.4", {{"3", "/old/3"}});
+    file.syncWithDatabase(study);
+    EXPECT_EQ(file.imagesByUID().size(), 3);
+}
+
+TEST_F(TagFileSyncTest, ReportsAreNoSeriesOfTheSkeleton)
+{
+    for (const char* modality : {"SR", "PR", "SEG", "MR"})
+        listSeries(modality, {}).modality = modality;
+    study->entries.back().seriesTime = "12:30:00";
+    file.copyDatabaseValuesIntoTagMap(*study);
+    EXPECT_EQ(file.seriesByUID().keys(), (Uids{"1.2.3", "1.2.4", "MR"}));
+    EXPECT_EQ(textOf(file.findSeries("MR"), DCM_SeriesTime), "123000");
+    EXPECT_EQ(file.findSeries("MR")->parent(), file.study().get());
+}
+
+struct VolumeName
+{
+    const char* name;
+    QList<QByteArray> names;  // of the series' two volumes afterwards
+    int warnings;
+};
+
+class VolumeNames : public TagFileSyncTest, public testing::WithParamInterface<VolumeName>
+{
+};
+
+TEST_P(VolumeNames, ChooseTheVolume)
+{
+    const LogCapture log;
+    TagMap* series = file.findSeries("1.2.3");
+    series->addBareVolume(new Volume(0));
+    series->addBareVolume(new Volume(1));
+    file.addVolumeFilePath(series, volumeFile(GetParam().name), false);
+    QList<QByteArray> names;
+    for (const Volume* volume : series->volumes())
+        names.append(volume->volumeFileName());
+    EXPECT_EQ(names, GetParam().names);
+    EXPECT_EQ(static_cast<int>(log.lines().size()), GetParam().warnings);
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Sync, VolumeNames,
+    testing::Values(VolumeName{"a-b.vol", {"a-b.vol", ""}, 0},
+                    VolumeName{"a_part002.vol", {"", "a_part002.vol"}, 0},
+                    VolumeName{"a_part2", {"", "a_part2"}, 0}, VolumeName{"a_part1", {"", ""}, 0},
+                    VolumeName{"a_part001.vol", {"", ""}, 0}, VolumeName{"a_part.vol", {"", ""}, 0},
+                    VolumeName{"a_part003.vol", {"", ""}, 1},
+                    VolumeName{"a_part99999999999999.vol", {"", ""}, 1}, VolumeName{"", {"", ""}, 0}));
+
+TEST_F(TagFileSyncTest, MissingVolumesAreMadeInTheirOrder)
+{
+    const LogCapture log;
+    TagMap* series = file.findSeries("1.2.3");
+    file.addVolumeFilePath(series, volumeFile("a.vol"), true);
+    file.addVolumeFilePath(series, volumeFile("a_part005.vol"), true);
+    EXPECT_EQ(series->volumes().size(), 2);
+    EXPECT_EQ(log.count("Invalid volume index 4 (expected 1) for a_part005.vol"), 1);
+    Entry image = volumeFile("a.vol");
+    image.type = Entry::DicomFile;
+    file.addVolumeFilePath(series, image, true);
+    EXPECT_EQ(series->volumes().size(), 2) << "a DICOM file is no volume";
+}
+
+TEST_F(TagFileSyncTest, MissingImagesAreMadeOnRequest)
+{
+    Kxg::SeriesInfo info;
+    info.images = {{"1", "/new/1"}, {"8", "/new/8"}};
+    bool complete = true;
+    EXPECT_EQ(file.addDicomFilePaths(file.findSeries("1.2.3"), &info, true, complete), 2);
+    EXPECT_TRUE(complete);
+    EXPECT_EQ(file.findImage("8")->parent(), file.findSeries("1.2.3"));
+    EXPECT_TRUE(file.findImage("8")->tagsForLevel().value(DCM_PixelData)->markedAsOmitted());
+}
+
+TEST_F(TagFileSyncTest, LabelsTellSeriesApart)
+{
+    TagFile labelled;
+    const auto addSeries = [&](const char* uid, const char* number, const char* description) {
+        add(labelled, anImage(uid)
+                          .inSeries(uid)
+                          .with(DCM_SeriesNumber, number)
+                          .with(DCM_SeriesDescription, description)
+                          .with(DCM_PixelData, "0"));
+    };
+    addSeries("1.1", "3", "axial");
+    addSeries("1.2", "3", "axial (1)");
+    addSeries("1.3", "3", "axial");
+    add(labelled,
+        anImage("1.4").inSeries("1.4").with(DCM_Modality, "SR").with(DCM_SeriesDescription, "axial"));
+    labelled.createAbstractTags();
+    labelled.createAbstractTags();
+    QList<QByteArray> labels;
+    for (const TagMap* series : labelled.seriesByUID())
+        labels.append(textOf(series, kAbstract));
+    EXPECT_EQ(labels, (QList<QByteArray>{"3 axial (2)", "3 axial (1)", "3 axial (3)", "SR"}));
+}
+
+}  // namespace
+}  // namespace Kdd
