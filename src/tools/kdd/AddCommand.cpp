@@ -1,21 +1,20 @@
+#include "kddlib/TagFileGenerator.h"
 #include "kddlib/tagfile/TagFile.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
 #include "tools/kdd/Commands.h"
-#include "tools/kdd/DicomInput.h"
-#include "tools/kdd/Progress.h"
+#include "tools/kdd/Database.h"
+#include "tools/kdd/FileScan.h"
+#include "tools/kdd/Registration.h"
 #include "tools/kdd/Report.h"
+#include "tools/kdd/StudyBuild.h"
 
 #include <QMap>
 
 #include <dcmtk/dcmdata/dctagkey.h>
 
 #include <cstdio>
-#include <deque>
-#include <future>
 #include <map>
-#include <thread>
-#include <vector>
 
 namespace Kdd
 {
@@ -24,9 +23,6 @@ namespace
 {
 
 const DcmTagKey kFilePath(0x0006, 0x7100);
-
-/// Files read ahead of the one being placed, so that reading uses every core.
-constexpr int kFilesPerTask = 16;
 
 /// Images held in memory before the studies that got none for the longest time are written.
 constexpr int kMaxPendingImages = 50000;
@@ -38,6 +34,7 @@ struct StudyTotals
 {
     int series = 0;
     int images = 0;
+    int volumes = 0;
     qint64 fileBytes = 0;
     qint64 headerBytes = 0;
     qint64 tagFileBytes = 0;
@@ -51,59 +48,63 @@ struct PendingStudy
     qint64 lastTouched = 0;
 };
 
+/// Takes files into the database and into the tag files of their studies.
 class Adder
 {
 public:
-    explicit Adder(const GlobalOptions& options)
-        : mOptions(options)
+    explicit Adder(Kxg::Catalogue& database)
+        : mDatabase(database)
+        , mRegistration(database)
     {
     }
 
-    void take(DicomInput input)
+    /// False when the database failed.
+    bool take(DicomInput input)
     {
-        switch (input.kind) {
-        case DicomInput::Kind::Image:
-            place(input);
-            break;
-        case DicomInput::Kind::NotDicom:
-            ++mSkipped;
-            if (mOptions.verbose)
-                LogFile::printf("Skipped %s: %s", input.path.constData(), qUtf8Printable(input.reason));
-            break;
-        case DicomInput::Kind::Unusable:
-            fail();
-            LogFile::errorf("Could not take %s: %s", input.path.constData(), qUtf8Printable(input.reason));
-            break;
+        if (!mRegistration.add(input))
+            return false;
+        if (input.kind == DicomInput::Kind::Image)
+            return place(input);
+        if (input.kind == DicomInput::Kind::Volume)
+            mPending[input.studyUID].lastTouched = ++mClock;
+        return true;
+    }
+
+    bool writeAll()
+    {
+        while (!mPending.empty()) {
+            if (!write(mPending.begin()))
+                return false;
         }
+        return mRegistration.flush();
     }
 
-    void fail(int count = 1) { mFailed += count; }
+    /// Builds what an earlier run registered below the paths without coming to the end of it.
+    bool completeWaiting(const QList<QByteArray>& paths);
 
-    void writeAll()
-    {
-        while (!mPending.empty())
-            write(mPending.begin());
-    }
-
-    Outcome report() const;
+    Outcome report(const GlobalOptions& options, const FileScan& scan) const;
 
 private:
     using Pending = std::map<QByteArray, PendingStudy>;
 
-    void place(DicomInput& input);
-    void write(Pending::iterator study);
-    void writeLongestUntouched();
+    bool place(DicomInput& input);
+    bool write(Pending::iterator study);
+    bool writeClaimed(Kxg::StudyClaim& claim, TagFile& file);
+    bool merge(TagFile& file);
+    bool writeLongestUntouched();
+    void count(const QByteArray& studyUID, const TagFile& file);
+    StudyTotals sum() const;
 
-    const GlobalOptions& mOptions;
+    Kxg::Catalogue& mDatabase;
+    Registration mRegistration;
     Pending mPending;
     QMap<QByteArray, StudyTotals> mTotals;
     qint64 mClock = 0;
     int mPendingImages = 0;
-    int mSkipped = 0;
     int mFailed = 0;
 };
 
-void Adder::place(DicomInput& input)
+bool Adder::place(DicomInput& input)
 {
     PendingStudy& study = mPending[input.studyUID];
     const QByteArray& path = input.path;
@@ -111,9 +112,9 @@ void Adder::place(DicomInput& input)
     // The last of several files of one instance is kept, as when they are added one after the other.
     TagMap* image = study.file.addTagMap(input.map.release(), path.constData(), true);
     if (image == nullptr) {
-        fail();
+        ++mFailed;
         LogFile::errorf("Could not take %s: it belongs nowhere", path.constData());
-        return;
+        return true;
     }
     image->putAndInsertValue(kFilePath, VrCode::LO, path);
     if (study.file.imagesByUID().size() == before) {
@@ -126,121 +127,150 @@ void Adder::place(DicomInput& input)
     StudyTotals& totals = mTotals[input.studyUID];
     totals.fileBytes += input.fileBytes;
     totals.headerBytes += input.headerBytes;
-    if (mPendingImages > kMaxPendingImages)
-        writeLongestUntouched();
+    return mPendingImages <= kMaxPendingImages || writeLongestUntouched();
 }
 
-void Adder::writeLongestUntouched()
+bool Adder::writeLongestUntouched()
 {
     auto oldest = mPending.begin();
     for (auto it = mPending.begin(); it != mPending.end(); ++it) {
         if (it->second.lastTouched < oldest->second.lastTouched)
             oldest = it;
     }
-    write(oldest);
+    return write(oldest);
 }
 
-void Adder::write(Pending::iterator study)
+/// False when the database failed; a study that cannot be written is told and counted.
+bool Adder::write(Pending::iterator study)
 {
+    if (!mRegistration.flush())
+        return false;
+    const QByteArray studyUID = study->first;
     TagFile& file = study->second.file;
-    file.optimizeAll();
+    const int images = study->second.images;
+    const std::unique_ptr<Kxg::StudyClaim> claim = claimStudy(mDatabase, studyUID);
+    if (claim != nullptr && writeClaimed(*claim, file)) {
+        count(studyUID, file);
+    } else {
+        LogFile::errorf("%d images of study %s are not added", images, studyUID.constData());
+        mFailed += qMax(1, images);
+        mTotals.remove(studyUID);
+    }
+    mPendingImages -= images;
+    mPending.erase(study);
+    return true;
+}
+
+/// Volumes are made of images that may be anywhere in the study, so a study with volume files is built as a whole; to
+/// any other what arrived is added.
+bool Adder::writeClaimed(Kxg::StudyClaim& claim, TagFile& file)
+{
+    QVector<QByteArray> volumes;
+    if (!succeeded(mDatabase.volumeFiles(claim.studyInstanceUID(), volumes)))
+        return false;
+    if (!volumes.isEmpty())
+        return buildStudy(claim, true, file);
+    TagFileGenerator().completeArrivals(file);
+    return merge(file) &&
+           succeeded(mDatabase.finishRequests(mRegistration.requests().take(claim.studyInstanceUID())));
+}
+
+bool Adder::merge(TagFile& file)
+{
     bool isMerged = file.mergeIntoCacheFile();
     for (int i = 1; i < kMergeAttempts && !isMerged && file.wasLockedOut(); ++i)
         isMerged = file.mergeIntoCacheFile();
-    if (isMerged) {
-        const TagFile::Statistics statistics = file.statistics();
-        StudyTotals& totals = mTotals[study->first];
-        totals.series = statistics.series;
-        totals.images = statistics.images;
-        totals.tagFileBytes = statistics.storedSize;
-    } else {
-        LogFile::errorf("%d images of study %s are not added", study->second.images,
-                        study->first.constData());
-        fail(study->second.images);
-        mTotals.remove(study->first);
-    }
-    mPendingImages -= study->second.images;
-    mPending.erase(study);
+    return isMerged;
 }
 
-Outcome Adder::report() const
+void Adder::count(const QByteArray& studyUID, const TagFile& file)
+{
+    const TagFile::Statistics statistics = file.statistics();
+    StudyTotals& totals = mTotals[studyUID];
+    totals.series = statistics.series;
+    totals.images = statistics.images;
+    totals.volumes = statistics.volumes;
+    totals.tagFileBytes = statistics.storedSize;
+}
+
+bool Adder::completeWaiting(const QList<QByteArray>& paths)
+{
+    QSet<QByteArray> waiting;
+    for (const QByteArray& path : paths) {
+        QVector<QByteArray> studies;
+        if (!succeeded(mDatabase.waitingStudies(absolutePath(path), studies)))
+            return false;
+        for (const QByteArray& study : qAsConst(studies))
+            waiting.insert(study);
+    }
+    for (const QByteArray& studyUID : qAsConst(waiting)) {
+        TagFile file;
+        const std::unique_ptr<Kxg::StudyClaim> claim = claimStudy(mDatabase, studyUID);
+        if (claim != nullptr && buildStudy(*claim, true, file))
+            count(studyUID, file);
+        else
+            ++mFailed;
+    }
+    return true;
+}
+
+StudyTotals Adder::sum() const
 {
     StudyTotals all;
-    QList<QStringList> rows{{QStringLiteral("STUDY"), QStringLiteral("SERIES "), QStringLiteral("IMAGES "),
-                             QStringLiteral("DICOM "), QStringLiteral("HEADERS "),
-                             QStringLiteral("TAG FILE ")}};
-    for (auto it = mTotals.cbegin(); it != mTotals.cend(); ++it) {
-        const StudyTotals& study = it.value();
+    for (const StudyTotals& study : mTotals) {
         all.series += study.series;
         all.images += study.images;
-        rows.append({displayText(it.key()), QString::number(study.series), QString::number(study.images),
-                     humanBytes(study.fileBytes), humanBytes(study.headerBytes),
-                     humanBytes(study.tagFileBytes)});
+        all.volumes += study.volumes;
     }
-    if (mOptions.json) {
+    return all;
+}
+
+Outcome Adder::report(const GlobalOptions& options, const FileScan& scan) const
+{
+    const StudyTotals all = sum();
+    const int failed = mFailed + scan.failed();
+    if (options.json) {
         printJson({{QStringLiteral("studies"), mTotals.size()},
                    {QStringLiteral("series"), all.series},
                    {QStringLiteral("images"), all.images},
-                   {QStringLiteral("volumes"), 0},
-                   {QStringLiteral("skipped"), mSkipped},
-                   {QStringLiteral("failed"), mFailed}});
-    } else if (!mOptions.quiet) {
+                   {QStringLiteral("volumes"), all.volumes},
+                   {QStringLiteral("unchanged"), scan.unchanged()},
+                   {QStringLiteral("skipped"), scan.skipped()},
+                   {QStringLiteral("failed"), failed}});
+        return failed == 0 ? Outcome::Done : Outcome::Failed;
+    }
+    QList<QStringList> rows{{QStringLiteral("STUDY"), QStringLiteral("SERIES "), QStringLiteral("IMAGES "),
+                             QStringLiteral("VOLUMES "), QStringLiteral("DICOM "), QStringLiteral("HEADERS "),
+                             QStringLiteral("TAG FILE ")}};
+    for (auto it = mTotals.cbegin(); it != mTotals.cend(); ++it) {
+        const StudyTotals& study = it.value();
+        rows.append({displayText(it.key()), QString::number(study.series), QString::number(study.images),
+                     QString::number(study.volumes), humanBytes(study.fileBytes),
+                     humanBytes(study.headerBytes), humanBytes(study.tagFileBytes)});
+    }
+    if (!options.quiet) {
         if (rows.size() > 1)
             printTable(rows);
-        std::printf("%d studies, %d series, %d images; %d files skipped, %d failed\n", mTotals.size(),
-                    all.series, all.images, mSkipped, mFailed);
+        std::printf(
+            "%d studies, %d series, %d images, %d volumes; %d files unchanged, %d skipped, %d failed\n",
+            mTotals.size(), all.series, all.images, all.volumes, scan.unchanged(), scan.skipped(), failed);
     }
-    return mFailed == 0 ? Outcome::Done : Outcome::Failed;
-}
-
-std::vector<DicomInput> readSome(const QList<QByteArray>& paths)
-{
-    std::vector<DicomInput> inputs;
-    inputs.reserve(static_cast<std::size_t>(paths.size()));
-    for (const QByteArray& path : paths)
-        inputs.push_back(readDicomInput(path));
-    return inputs;
-}
-
-/// Reads the files on as many threads as there are cores and hands them on in their order.
-template <typename Take>
-void readAll(const QList<QByteArray>& files, Take take)
-{
-    const unsigned ahead = qMax(1U, std::thread::hardware_concurrency());
-    std::deque<std::future<std::vector<DicomInput>>> running;
-    int next = 0;
-    while (next < files.size() || !running.empty()) {
-        while (next < files.size() && running.size() <= ahead) {
-            running.push_back(std::async(std::launch::async, readSome, files.mid(next, kFilesPerTask)));
-            next += kFilesPerTask;
-        }
-        for (DicomInput& input : running.front().get())
-            take(std::move(input));
-        running.pop_front();
-    }
+    return failed == 0 ? Outcome::Done : Outcome::Failed;
 }
 
 }  // namespace
 
 Outcome runAdd(const GlobalOptions& options, const QList<QByteArray>& paths)
 {
-    QStringList faults;
-    const QList<QByteArray> files = filesBelow(paths, faults);
-    Adder adder(options);
-    for (const QString& fault : qAsConst(faults)) {
-        LogFile::errorf("Could not look into %s", qUtf8Printable(fault));
-        adder.fail();
-    }
-    {
-        Progress progress("Reading", !options.quiet);
-        qint64 done = 0;
-        readAll(files, [&](DicomInput input) {
-            adder.take(std::move(input));
-            progress.show(++done, files.size());
-        });
-    }
-    adder.writeAll();
-    return adder.report();
+    const std::unique_ptr<Kxg::Catalogue> database = openDatabase();
+    if (database == nullptr)
+        return Outcome::Failed;
+    FileScan scan(*database, options);
+    Adder adder(*database);
+    const bool isDone = scan.run(paths, [&](DicomInput input) { return adder.take(std::move(input)); }) &&
+                        adder.writeAll() && (scan.unchanged() == 0 || adder.completeWaiting(paths));
+    const Outcome outcome = adder.report(options, scan);
+    return isDone ? outcome : Outcome::Failed;
 }
 
 }  // namespace Kdd

@@ -13,6 +13,7 @@ struct GlobalOptions
     bool json = false;     ///< one machine-readable result on standard output
     bool quiet = false;    ///< no progress, only errors
     bool verbose = false;  ///< names everything that is passed over
+    QString store;         ///< the folder of everything that is kept
 };
 
 /// How a command ends; the numbers are the exit codes.
@@ -43,6 +44,27 @@ struct StudySelection
     bool all = false;
 };
 
+struct BuildRequest
+{
+    StudySelection selection;  ///< neither studies nor all: what waits to be built
+    bool again = false;        ///< with all: also what has a tag file that nothing changed since
+    bool optimize = true;
+    int jobs = 1;
+};
+
+struct PreviewsRequest
+{
+    StudySelection selection;
+    QString folder;
+    QString sheet;  ///< file of the contact sheet; empty for none
+};
+
+struct StackRequest
+{
+    StudySelection selection;
+    bool again = false;  ///< also series that have volume files already
+};
+
 struct SampleRequest
 {
     QString folder;
@@ -51,6 +73,11 @@ struct SampleRequest
 };
 
 Outcome runAdd(const GlobalOptions& options, const QList<QByteArray>& paths);
+Outcome runIndex(const GlobalOptions& options, const QList<QByteArray>& paths);
+Outcome runBuild(const GlobalOptions& options, const BuildRequest& request);
+Outcome runSync(const GlobalOptions& options, const QByteArray& study);
+Outcome runStack(const GlobalOptions& options, const StackRequest& request);
+Outcome runPreviews(const GlobalOptions& options, const PreviewsRequest& request);
 Outcome runList(const GlobalOptions& options);
 Outcome runShow(const GlobalOptions& options, const ShowOptions& show);
 Outcome runMetadata(const GlobalOptions& options, const NodeSelection& selection);

@@ -1,6 +1,7 @@
 #include "tools/kdd/DatasetVerifier.h"
 
 #include "kddlib/Limits.h"
+#include "kddlib/tagmodel/PrivateCreator.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/tagmodel/TagSequence.h"
 #include "tools/kdd/AttributeText.h"
@@ -18,6 +19,16 @@ using Report = std::function<void(const QByteArray&, const QByteArray&)>;
 bool isKept(const DcmTagKey& key)
 {
     return key.getGroup() != 0 && key.getElement() != 0 && key.getGroup() != 0x0006;
+}
+
+/// What building adds to an image: navigation data under our private creator.
+bool isOurOwn(const TagMap& map, const DcmTagKey& key)
+{
+    constexpr Uint16 kGroup = 0x0071;
+    const char* creator = map.privateCreator(key);
+    const TagElement* reserved = map.findElement(key);
+    return key.getGroup() == kGroup && (creator != nullptr ? qstrcmp(creator, kOurPrivateCreator) == 0
+                                                           : reserved->value() == kOurPrivateCreator);
 }
 
 /// The value as DCMTK gives it: text without padding, all else byte by byte.
@@ -60,7 +71,7 @@ public:
             if (!isKept(key))
                 continue;
             for (; held != end && held.key() < key; ++held)
-                onlyHeld(held.key(), prefix);
+                onlyHeld(map, held.key(), prefix);
             if (held == end || held.key() != key) {
                 fault(prefix + keyText(key), "is not in the tag file");
                 continue;
@@ -71,7 +82,7 @@ public:
             ++held;
         }
         for (; held != end; ++held)
-            onlyHeld(held.key(), prefix);
+            onlyHeld(map, held.key(), prefix);
     }
 
 private:
@@ -81,9 +92,9 @@ private:
         mReport(path, text);
     }
 
-    void onlyHeld(const DcmTagKey& key, const QByteArray& prefix)
+    void onlyHeld(const TagMap& map, const DcmTagKey& key, const QByteArray& prefix)
     {
-        if (isKept(key))
+        if (isKept(key) && !isOurOwn(map, key))
             fault(prefix + keyText(key), "is not in the DICOM file");
     }
 

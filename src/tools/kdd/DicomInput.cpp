@@ -3,7 +3,10 @@
 #include "kddlib/Limits.h"
 #include "kddlib/net/DicomFileReader.h"
 #include "kddlib/tagmodel/TagMap.h"
+#include "kddlib/volumes/VolumeInfo.h"
+#include "platform/os/FileStatus.h"
 #include "platform/os/RandomAccessFile.h"
+#include "platform/volumefile/OrlanMesh.h"
 
 #include <dcmtk/dcmdata/dctk.h>
 
@@ -48,15 +51,15 @@ bool isMediaDirectory(DcmFileFormat& file)
            file.getDataset()->tagExists(DCM_DirectoryRecordSequence);
 }
 
-/// Bytes other than those of UIDs, of which archives have seen letters and hyphens too. A UID with anything else
-/// comes from damage, and it would be a trap in lists, logs and requests.
+/// Too long, or with bytes other than those of UIDs, of which archives have seen letters and hyphens too. A UID with
+/// anything else comes from damage, and it would be a trap in lists, logs and requests.
 bool isStrange(const QByteArray& uid)
 {
-    return std::any_of(uid.begin(), uid.end(), [](char c) {
-        const bool isFine = (c >= '0' && c <= '9') || (c >= 'A' && c <= 'Z') || (c >= 'a' && c <= 'z') ||
-                            c == '.' || c == '-' || c == '_';
-        return !isFine;
-    });
+    return uid.size() > Kxg::kMaxUID || std::any_of(uid.begin(), uid.end(), [](char c) {
+               const bool isFine = (c >= '0' && c <= '9') || (c >= 'A' && c <= 'Z') ||
+                                   (c >= 'a' && c <= 'z') || c == '.' || c == '-' || c == '_';
+               return !isFine;
+           });
 }
 
 /// The first of the three UIDs that cannot be used as a name; null when all can.
@@ -109,7 +112,23 @@ DicomInput& take(DicomInput& input, DcmFileFormat& file)
                       QStringLiteral("%1 has bytes that no UID has").arg(QLatin1String(name)));
     }
     input.studyUID = input.map->uid(TagMap::StudyLevel);
+    input.seriesUID = input.map->uid(TagMap::SeriesLevel);
     input.kind = DicomInput::Kind::Image;
+    return input;
+}
+
+DicomInput& takeVolume(DicomInput& input)
+{
+    Result result;
+    const std::unique_ptr<OrlanMesh> mesh = OrlanMesh::read(input.path, result);
+    if (mesh == nullptr)
+        return refuse(input, DicomInput::Kind::Unusable, result.text());
+    input.studyUID = dicomValue(*mesh, "G0020-000D");
+    input.seriesUID = dicomValue(*mesh, "G0020-000E");
+    if (input.studyUID.isEmpty() || input.seriesUID.isEmpty() || isStrange(input.studyUID) ||
+        isStrange(input.seriesUID))
+        return refuse(input, DicomInput::Kind::Unusable, QStringLiteral("It names no study and series"));
+    input.kind = DicomInput::Kind::Volume;
     return input;
 }
 
@@ -150,7 +169,7 @@ void collect(const std::filesystem::path& place, QList<QByteArray>& files, QStri
     if (std::filesystem::is_directory(status))
         collectBelow(place, files, faults);
     else if (!std::filesystem::is_other(status))
-        files.append(bytes(std::filesystem::absolute(place).lexically_normal()));
+        files.append(absolutePath(bytes(place)));
 }
 
 }  // namespace
@@ -164,22 +183,37 @@ DicomInput readDicomInput(const QByteArray& path)
 {
     DicomInput input;
     input.path = path;
+    FileStatus status;
+    if (statusOf(path.constData(), status))
+        input.stamp = {status.size, status.modified};
+    if (path.size() > Kxg::kMaxPath)
+        return std::move(refuse(input, DicomInput::Kind::Unusable, QStringLiteral("Its path is too long")));
     RandomAccessFile file;
     if (const int error = file.open(path.constData()))
         return std::move(refuse(input, DicomInput::Kind::Unusable, errnoText(error)));
     input.fileBytes = file.size();
     if (input.fileBytes == 0)
         return std::move(refuse(input, DicomInput::Kind::Unusable, QStringLiteral("The file is empty")));
+    if (OrlanMesh::isVolumeFile(path))
+        return std::move(takeVolume(input));
     const bool isDicom = hasDicomPrefix(file);
     DcmFileFormat format;
     const OFCondition condition = readDicomFile(path.constData(), format);
     if (condition.bad() || (!isDicom && !namesItself(*format.getDataset())))
-        return std::move(refuse(input, isDicom ? DicomInput::Kind::Unusable : DicomInput::Kind::NotDicom,
+        return std::move(refuse(input, isDicom ? DicomInput::Kind::Unusable : DicomInput::Kind::Other,
                                 condition.bad() ? QString::fromLatin1(condition.text())
                                                 : QStringLiteral("No DICOM object")));
     if (isMediaDirectory(format))
-        return std::move(refuse(input, DicomInput::Kind::NotDicom, QStringLiteral("Media directory")));
+        return std::move(refuse(input, DicomInput::Kind::Other, QStringLiteral("Media directory")));
     return std::move(take(input, format));
+}
+
+QByteArray absolutePath(const QByteArray& path)
+{
+    QByteArray absolute = bytes(std::filesystem::absolute(path.toStdString()).lexically_normal());
+    if (absolute.size() > 1 && absolute.endsWith('/'))
+        absolute.chop(1);
+    return absolute;
 }
 
 QList<QByteArray> filesBelow(const QList<QByteArray>& paths, QStringList& faults)

@@ -1,5 +1,7 @@
 #pragma once
 
+#include "platform/database/Catalogue.h"
+
 #include <QByteArray>
 #include <QList>
 #include <QString>
@@ -17,15 +19,18 @@ struct DicomInput
 {
     enum class Kind {
         Image,     ///< `map` holds it
-        NotDicom,  ///< something else, which is no fault
+        Volume,    ///< a volume file
+        Other,     ///< neither, which is no fault
         Unusable,  ///< cannot be read, or would not be found again
     };
 
-    Kind kind = Kind::NotDicom;
+    Kind kind = Kind::Other;
     QByteArray path;
-    QString reason;               ///< of anything but an image
-    std::unique_ptr<TagMap> map;  ///< parentless
+    Kxg::FileStamp stamp;         ///< as it was before it was read
+    QString reason;               ///< why it is neither image nor volume
+    std::unique_ptr<TagMap> map;  ///< of an image, parentless
     QByteArray studyUID;
+    QByteArray seriesUID;
     qint64 fileBytes = 0;
     qint64 headerBytes = 0;  ///< the file without its pixel data
 
@@ -35,7 +40,7 @@ struct DicomInput
     ~DicomInput();
 };
 
-/// Reads one file. Media directories (DICOMDIR) count as not DICOM: they describe files, not patients. May be called
+/// Reads one file: of an image its attributes, of a volume file its header. Media directories (DICOMDIR) count as not DICOM: they describe files, not patients. May be called
 /// on several threads at once.
 DicomInput readDicomInput(const QByteArray& path);
 
@@ -43,5 +48,8 @@ DicomInput readDicomInput(const QByteArray& path);
 /// cannot be entered are put into `faults` with the reason. Paths are bytes: a name that is no text in the present
 /// locale is a file like any other.
 QList<QByteArray> filesBelow(const QList<QByteArray>& paths, QStringList& faults);
+
+/// The path as `filesBelow` gives it.
+QByteArray absolutePath(const QByteArray& path);
 
 }  // namespace Kdd

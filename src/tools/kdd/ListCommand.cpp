@@ -1,13 +1,10 @@
-#include "kddlib/tagmodel/TagMap.h"
-#include "tools/kdd/AttributeText.h"
+#include "kddlib/tagfile/TagFile.h"
 #include "tools/kdd/Commands.h"
+#include "tools/kdd/Database.h"
 #include "tools/kdd/Report.h"
-#include "tools/kdd/Store.h"
 
 #include <QFileInfo>
 #include <QJsonArray>
-
-#include <dcmtk/dcmdata/dcdeftag.h>
 
 #include <cstdio>
 
@@ -25,24 +22,23 @@ struct ListedStudy
     QString modalities;
     int series = 0;
     int images = 0;
-    qint64 bytes = 0;
+    int volumes = 0;
+    qint64 bytes = 0;  ///< of the tag file; 0 when there is none
+    bool isWaiting = false;
 };
 
-ListedStudy describe(const TagFile& file, const QString& path)
+ListedStudy describe(const Kxg::StudySummary& study)
 {
-    const TagMap& study = *file.study();
-    QStringList modalities;
-    for (const TagMap* series : study.children())
-        modalities.append(displayValue(*series, DCM_Modality));
-    modalities.removeDuplicates();
-    modalities.sort();
-    return {displayText(file.studyInstanceUID()),
-            displayValue(study, DCM_PatientName),
-            displayValue(study, DCM_StudyDate),
-            modalities.join(QLatin1Char(' ')),
-            file.seriesByUID().size(),
-            file.imagesByUID().size(),
-            QFileInfo(path).size()};
+    const QString tagFile = TagFile::cacheFilePathForStudy(study.studyInstanceUID.constData());
+    return {displayText(study.studyInstanceUID),
+            displayText(study.patientName),
+            displayText(study.studyDate),
+            displayText(study.modalities),
+            study.series,
+            study.images,
+            study.volumes,
+            QFileInfo(tagFile).size(),
+            study.isWaiting};
 }
 
 void printJsonList(const QList<ListedStudy>& studies)
@@ -55,7 +51,9 @@ void printJsonList(const QList<ListedStudy>& studies)
                                 {QStringLiteral("modalities"), study.modalities},
                                 {QStringLiteral("series"), study.series},
                                 {QStringLiteral("images"), study.images},
-                                {QStringLiteral("bytes"), study.bytes}});
+                                {QStringLiteral("volumes"), study.volumes},
+                                {QStringLiteral("bytes"), study.bytes},
+                                {QStringLiteral("waiting"), study.isWaiting}});
     }
     printJson({{QStringLiteral("studies"), list}});
 }
@@ -64,10 +62,12 @@ void printList(const QList<ListedStudy>& studies)
 {
     QList<QStringList> rows{{QStringLiteral("STUDY"), QStringLiteral("PATIENT"), QStringLiteral("DATE"),
                              QStringLiteral("MODALITIES"), QStringLiteral("SERIES "),
-                             QStringLiteral("IMAGES "), QStringLiteral("TAG FILE ")}};
+                             QStringLiteral("IMAGES "), QStringLiteral("VOLUMES "),
+                             QStringLiteral("TAG FILE ")}};
     for (const ListedStudy& study : studies)
         rows.append({study.uid, study.patient, study.date, study.modalities, QString::number(study.series),
-                     QString::number(study.images), humanBytes(study.bytes)});
+                     QString::number(study.images), QString::number(study.volumes),
+                     study.isWaiting ? QStringLiteral("waiting") : humanBytes(study.bytes)});
     printTable(rows);
 }
 
@@ -75,20 +75,18 @@ void printList(const QList<ListedStudy>& studies)
 
 Outcome runList(const GlobalOptions& options)
 {
+    const std::unique_ptr<Kxg::Catalogue> database = openDatabase();
+    std::vector<Kxg::StudySummary> registered;
+    if (database == nullptr || !succeeded(database->listStudies(registered)))
+        return Outcome::Failed;
     QList<ListedStudy> studies;
-    bool allRead = true;
-    for (const QString& path : storedTagFiles()) {
-        TagFile file;
-        if (readStudyFile(path, file))
-            studies.append(describe(file, path));
-        else
-            allRead = false;
-    }
+    for (const Kxg::StudySummary& study : registered)
+        studies.append(describe(study));
     if (options.json)
         printJsonList(studies);
     else
         printList(studies);
-    return allRead ? Outcome::Done : Outcome::Failed;
+    return Outcome::Done;
 }
 
 }  // namespace Kdd

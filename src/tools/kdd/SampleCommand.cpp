@@ -1,7 +1,8 @@
-#include "platform/base/LogFile.h"
 #include "tools/kdd/Commands.h"
+#include "tools/kdd/Database.h"
 #include "tools/kdd/Progress.h"
 #include "tools/kdd/Report.h"
+#include "tools/kdd/SampleVolumes.h"
 #include "tools/kdd/sample/SampleStudies.h"
 
 #include <cstdio>
@@ -17,18 +18,21 @@ Outcome runSample(const GlobalOptions& options, const SampleRequest& request)
         summary = writeSampleStudies(request.folder, {request.images, request.seed},
                                      [&](int done, int total) { progress.show(done, total); });
     }
-    if (!summary.failure.isEmpty()) {
-        LogFile::errorf("%s", qUtf8Printable(summary.failure));
+    int volumes = 0;
+    const Result result = summary.failure.isEmpty()
+                              ? writeSampleVolumes(request.folder, volumes, summary.bytes)
+                              : Result::failure(summary.failure);
+    if (!succeeded(result))
         return Outcome::Failed;
-    }
     if (options.json) {
         printJson({{QStringLiteral("studies"), summary.studies},
                    {QStringLiteral("series"), summary.series},
                    {QStringLiteral("images"), summary.images},
+                   {QStringLiteral("volumes"), volumes},
                    {QStringLiteral("bytes"), summary.bytes}});
     } else if (!options.quiet) {
-        std::printf("%d studies, %d series, %d images, %s in %s\n", summary.studies, summary.series,
-                    summary.images, qUtf8Printable(humanBytes(summary.bytes)),
+        std::printf("%d studies, %d series, %d images, %d volumes, %s in %s\n", summary.studies,
+                    summary.series, summary.images, volumes, qUtf8Printable(humanBytes(summary.bytes)),
                     qUtf8Printable(request.folder));
     }
     return Outcome::Done;

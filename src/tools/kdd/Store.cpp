@@ -1,12 +1,22 @@
 #include "tools/kdd/Store.h"
 
 #include "platform/base/LogFile.h"
+#include "tools/kdd/Database.h"
 
+#include <QByteArrayList>
 #include <QDirIterator>
 #include <QFileInfo>
 
 namespace Kdd
 {
+
+namespace
+{
+
+/// Of the studies that a beginning fits so many are named.
+constexpr int kNamesToTell = 3;
+
+}  // namespace
 
 QStringList storedTagFiles()
 {
@@ -29,20 +39,26 @@ bool resolveStudy(const QByteArray& text, QByteArray& studyUID)
         studyUID = text;
         return true;
     }
-    QList<QByteArray> found;
+    const std::unique_ptr<Kxg::Catalogue> database = openDatabase();
+    return database != nullptr && resolveStudy(*database, text, studyUID);
+}
+
+bool resolveStudy(Kxg::Catalogue& database, const QByteArray& text, QByteArray& studyUID)
+{
+    QVector<QByteArray> found;
     // Every UID begins with nothing, but whoever names nothing has not chosen a study.
-    for (const QString& path : text.isEmpty() ? QStringList() : storedTagFiles()) {
-        TagFile file;
-        if (file.readCacheFile(path, nullptr, false) && file.studyInstanceUID().startsWith(text))
-            found.append(file.studyInstanceUID());
+    if (!text.isEmpty() && !succeeded(database.findStudies(text, kNamesToTell, found)))
+        return false;
+    if (found.size() == 1 || found.contains(text)) {
+        studyUID = found.contains(text) ? text : found.first();
+        return true;
     }
-    if (found.size() == 1)
-        studyUID = found.first();
-    else if (found.isEmpty())
+    if (found.isEmpty())
         LogFile::errorf("No study is named \"%s\"", text.constData());
     else
-        LogFile::errorf("%d studies begin with %s", found.size(), text.constData());
-    return found.size() == 1;
+        LogFile::errorf("Several studies begin with %s: %s, ...", text.constData(),
+                        QByteArrayList(found.toList()).join(", ").constData());
+    return false;
 }
 
 bool readStudy(const QByteArray& text, TagFile& file)

@@ -1,6 +1,7 @@
 #pragma once
 
 #include "kddlib/tagfile/TagFile.h"
+#include "platform/database/Catalogue.h"
 
 #include <QByteArray>
 #include <QStringList>
@@ -12,8 +13,9 @@ namespace Kdd
 QStringList storedTagFiles();
 
 /// Finds the study whose UID is `text` or, if that names none, begins with it. On failure (none, or several) the
-/// reason is logged. The beginning of a UID costs the reading of every tag file.
+/// reason is logged. The database is asked only when `text` is not the UID of a tag file.
 bool resolveStudy(const QByteArray& text, QByteArray& studyUID);
+bool resolveStudy(Kxg::Catalogue& database, const QByteArray& text, QByteArray& studyUID);
 
 /// Reads the study that `text` names; failures are logged.
 bool readStudy(const QByteArray& text, TagFile& file);

@@ -1,6 +1,8 @@
 #include "kddlib/tagfile/TagFile.h"
 #include "platform/base/BuildInfo.h"
 #include "platform/base/LogFile.h"
+#include "platform/database/Kxg.h"
+#include "platform/resources/ExResource.h"
 #include "tools/kdd/Commands.h"
 
 #include <QStandardPaths>
@@ -10,6 +12,7 @@
 #include <CLI/CLI.hpp>
 #include <dcmtk/oflog/oflog.h>
 
+#include <algorithm>
 #include <cstdio>
 #include <exception>
 #include <functional>
@@ -24,6 +27,7 @@ namespace
 struct StoreOptions
 {
     std::string store;
+    std::string database;
     std::string meta;
     TagFile::CompressionMode compression = TagFile::CompressionMode::Zlib;
     bool flush = false;
@@ -60,6 +64,9 @@ QString path(const std::string& text)
 void addGlobalOptions(CLI::App& app, GlobalOptions& global, StoreOptions& store)
 {
     app.add_option("--store", store.store, "Folder of everything that is kept")->envname("KDD_STORE");
+    app.add_option("--database", store.database,
+                   "Image database: sqlite:FILE or postgresql://... (default: kdd.sqlite inside the store)")
+        ->envname("KDD_DATABASE");
     app.add_option("--meta", store.meta, "Folder of the tag files (default: meta inside the store)")
         ->envname("KDD_META_FOLDER");
     app.add_option("--compression", store.compression, "How tag files are written: none, zlib or lzma")
@@ -73,22 +80,38 @@ void addGlobalOptions(CLI::App& app, GlobalOptions& global, StoreOptions& store)
     app.set_version_flag("--version", BuildInfo::text());
 }
 
-void applyStore(const GlobalOptions& global, const StoreOptions& store)
+/// The folder named, else the user's own.
+QString storeFolder(const StoreOptions& store)
+{
+    return store.store.empty() ? QStandardPaths::writableLocation(QStandardPaths::GenericDataLocation) +
+                                     QStringLiteral("/kdd")
+                               : path(store.store);
+}
+
+/// The first that is not empty.
+QByteArray firstOf(const QList<QByteArray>& texts)
+{
+    return *std::find_if(texts.begin(), texts.end() - 1,
+                         [](const QByteArray& text) { return !text.isEmpty(); });
+}
+
+void applyLogging(const GlobalOptions& global)
 {
     LogFile::setLevel(global.quiet     ? LogFile::Level::Errors
                       : global.verbose ? LogFile::Level::Timing
                                        : LogFile::Level::Warnings);
     // DCMTK's own lines do not name the file; what matters of them is told with it.
     OFLog::configure(global.verbose ? OFLogger::WARN_LOG_LEVEL : OFLogger::OFF_LOG_LEVEL);
-    std::string meta = store.meta;
-    if (meta.empty()) {
-        const QString root = store.store.empty()
-                                 ? QStandardPaths::writableLocation(QStandardPaths::GenericDataLocation) +
-                                       QStringLiteral("/kdd")
-                                 : path(store.store);
-        meta = (root + QStringLiteral("/meta")).toLocal8Bit().toStdString();
-    }
-    TagFile::setMetaFolder(meta.c_str());
+}
+
+void applyStore(GlobalOptions& global, const StoreOptions& store)
+{
+    global.store = storeFolder(store);
+    const QByteArray root = global.store.toLocal8Bit();
+    const QByteArray meta = firstOf({bytes(store.meta), ExResource::metaFolder(), root + "/meta"});
+    Kxg::SetDatabaseServer(
+        firstOf({bytes(store.database), ExResource::databaseAddress(), "sqlite:" + root + "/kdd.sqlite"}));
+    TagFile::setMetaFolder(meta.constData());
     TagFile::setCompressionMode(store.compression);
     if (store.flush)
         TagFile::setDurability(TagFile::Durability::PowerLoss);
@@ -120,6 +143,7 @@ public:
         , mGlobal(global)
         , mChosen(chosen)
     {
+        declareTaking();
         declareStoring();
         declareReading();
         declareChecking();
@@ -134,16 +158,52 @@ private:
         return *subcommand;
     }
 
+    QList<QByteArray> paths() const { return listOf(mPaths); }
+
+    StudySelection studies() const { return {listOf(mStudies), mAll}; }
+
+    static QList<QByteArray> listOf(const std::vector<std::string>& texts)
+    {
+        QList<QByteArray> list;
+        for (const std::string& text : texts)
+            list.append(bytes(text));
+        return list;
+    }
+
+    void addPaths(CLI::App& command) { command.add_option("PATH", mPaths, "Files and folders")->required(); }
+
+    void addStudies(CLI::App& command)
+    {
+        command.add_option("UID", mStudies, "Study Instance UIDs, or unique beginnings of them");
+        command.add_flag("--all", mAll, "Every study");
+    }
+
+    void declareTaking()
+    {
+        addPaths(declare("add", "Take the DICOM and volume files below the paths into database and tag files",
+                         [this] { return runAdd(mGlobal, paths()); }));
+        addPaths(declare("index", "Register the DICOM and volume files below the paths in the database only",
+                         [this] { return runIndex(mGlobal, paths()); }));
+        CLI::App& build =
+            declare("build", "Build the tag files of studies that wait for it, or of those named", [this] {
+                return runBuild(mGlobal, {studies(), mAgain, !mNoOptimize, mJobs});
+            });
+        addStudies(build);
+        build.add_flag("--again", mAgain, "With --all: also those whose files did not change");
+        build.add_flag("--no-optimize", mNoOptimize, "Leave every attribute where it was found");
+        build.add_option("--jobs", mJobs, "Studies built at once")->check(CLI::Range(1, 256));
+        CLI::App& stack = declare("stack", "Make volume files from the series that can be stacked", [this] {
+            return runStack(mGlobal, {studies(), mAgain});
+        });
+        addStudies(stack);
+        stack.add_flag("--again", mAgain, "Also series that have volume files already");
+    }
+
     void declareStoring()
     {
-        declare("add", "Take the DICOM files below the paths into the tag files of their studies",
-                [this] {
-                    QList<QByteArray> paths;
-                    for (const std::string& text : mPaths)
-                        paths.append(bytes(text));
-                    return runAdd(mGlobal, paths);
-                })
-            .add_option("PATH", mPaths, "Files and folders")
+        declare("sync", "Bring a study's tag file into line with the database",
+                [this] { return runSync(mGlobal, bytes(mNode.study)); })
+            .add_option("UID", mNode.study, "Study Instance UID, or a unique beginning of it")
             ->required();
         mNode.addTo(declare("delete", "Delete a study's tag file, a series or an image",
                             [this] { return runDelete(mGlobal, mNode.selection()); }));
@@ -158,6 +218,13 @@ private:
 
     void declareReading()
     {
+        CLI::App& previews = declare("previews", "Export the previews of studies",
+                                     [this] { return runPreviews(mGlobal, previewsRequest()); });
+        previews.add_option("NAMES", mPaths, "The studies, and last the folder to write to")
+            ->option_text("UID... DIR")
+            ->required();
+        previews.add_flag("--all", mAll, "Every study; then name the folder only");
+        previews.add_option("--sheet", mFolder, "Also put all pictures of the folder into this one picture");
         declare("list", "List the studies", [this] { return runList(mGlobal); });
         CLI::App& show = declare("show", "Show the attributes of a node", [this] {
             return runShow(mGlobal, {mNode.selection(), mOwn, mTree});
@@ -179,16 +246,15 @@ private:
                                  [this] { return runDiff(mGlobal, path(mLeft), path(mRight)); });
         diff.add_option("LEFT", mLeft, "Study UID, tag file or DICOM file")->required();
         diff.add_option("RIGHT", mRight, "Study UID, tag file or DICOM file")->required();
-        CLI::App& verify =
-            declare("verify", "Hold tag files against the DICOM files they were made from", [this] {
-                StudySelection selection;
-                selection.all = mAll;
-                for (const std::string& text : mStudies)
-                    selection.studies.append(bytes(text));
-                return runVerify(mGlobal, selection);
-            });
-        verify.add_option("UID", mStudies, "Study Instance UIDs, or unique beginnings of them");
-        verify.add_flag("--all", mAll, "Every study");
+        addStudies(declare("verify", "Hold tag files against the DICOM files they were made from",
+                           [this] { return runVerify(mGlobal, studies()); }));
+    }
+
+    PreviewsRequest previewsRequest() const
+    {
+        QList<QByteArray> names = paths();
+        const QString folder = path(names.takeLast().toStdString());
+        return {{names, mAll}, folder, path(mFolder)};
     }
 
     CLI::App& mApp;
@@ -206,6 +272,9 @@ private:
     std::string mRight;
     std::vector<std::string> mStudies;
     bool mAll = false;
+    bool mAgain = false;
+    bool mNoOptimize = false;
+    int mJobs = 1;
 };
 
 Outcome run(int argc, char** argv)
@@ -226,6 +295,7 @@ Outcome run(int argc, char** argv)
         std::fprintf(stderr, "kdd: name a command; kdd --help lists them\n");
         return Outcome::WrongUsage;
     }
+    applyLogging(global);
     applyStore(global, store);
     return whenWritten(chosen());
 }

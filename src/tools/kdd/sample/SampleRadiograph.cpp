@@ -15,7 +15,7 @@ namespace
 
 constexpr int kColumns = 80;
 constexpr int kRows = 96;
-constexpr int kLutEntries = 64;
+constexpr int kLutEntries = 4096;
 
 const SampleAttribute kMachine[] = {
     {DCM_ImageType, "DERIVED\\PRIMARY"},

@@ -1,0 +1,47 @@
+#include "tools/kdd/Database.h"
+
+#include "platform/base/LogFile.h"
+#include "platform/database/Kxg.h"
+#include "tools/kdd/Store.h"
+
+namespace Kdd
+{
+
+std::unique_ptr<Kxg::Catalogue> openDatabase()
+{
+    Result result;
+    std::unique_ptr<Kxg::Catalogue> database = Kxg::Catalogue::open(Kxg::DatabaseServer(), result);
+    succeeded(result);
+    return database;
+}
+
+bool succeeded(const Result& result)
+{
+    if (result.bad())
+        LogFile::errorf("%s", qUtf8Printable(result.text()));
+    return result.good();
+}
+
+bool chooseStudies(Kxg::Catalogue& database, const QList<QByteArray>& named, bool all,
+                   QVector<QByteArray>& studyUIDs)
+{
+    if (all) {
+        std::vector<Kxg::StudySummary> studies;
+        if (!succeeded(database.listStudies(studies)))
+            return false;
+        for (const Kxg::StudySummary& study : studies)
+            studyUIDs.append(study.studyInstanceUID);
+        return true;
+    }
+    bool allFound = true;
+    for (const QByteArray& text : named) {
+        QByteArray studyUID;
+        if (!resolveStudy(database, text, studyUID))
+            allFound = false;
+        else if (!studyUIDs.contains(studyUID))
+            studyUIDs.append(studyUID);
+    }
+    return allFound;
+}
+
+}  // namespace Kdd

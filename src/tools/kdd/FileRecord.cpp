@@ -1,0 +1,64 @@
+#include "tools/kdd/FileRecord.h"
+
+#include "kddlib/items/TextDecoding.h"
+#include "kddlib/tagmodel/TagMap.h"
+
+#include <dcmtk/dcmdata/dcdeftag.h>
+
+namespace Kdd
+{
+
+namespace
+{
+
+/// The texts of one image in UTF-8.
+class Texts
+{
+public:
+    explicit Texts(const TagMap& image)
+        : mImage(image)
+    {
+        image.findAndGetString(DCM_SpecificCharacterSet, mCharacterSet);
+    }
+
+    QByteArray operator()(const DcmTagKey& key) const
+    {
+        QByteArray bytes;
+        mImage.findAndGetString(key, bytes);
+        return decodeText(bytes, mCharacterSet).trimmed().toUtf8();
+    }
+
+private:
+    const TagMap& mImage;
+    QByteArray mCharacterSet;
+};
+
+}  // namespace
+
+Kxg::DicomFileRecord fileRecord(const TagMap& image, const QByteArray& path, const Kxg::FileStamp& stamp)
+{
+    const Texts text(image);
+    Kxg::DicomFileRecord record;
+    record.path = path;
+    record.stamp = stamp;
+    record.studyInstanceUID = image.uid(TagMap::StudyLevel);
+    record.seriesInstanceUID = image.uid(TagMap::SeriesLevel);
+    record.sopInstanceUID = image.uid(TagMap::ImageLevel);
+    record.patientName = text(DCM_PatientName);
+    record.patientID = text(DCM_PatientID);
+    record.patientBirthDate = text(DCM_PatientBirthDate);
+    record.patientSex = text(DCM_PatientSex);
+    record.studyDate = text(DCM_StudyDate);
+    record.studyTime = text(DCM_StudyTime);
+    record.studyDescription = text(DCM_StudyDescription);
+    record.accessionNumber = text(DCM_AccessionNumber);
+    record.seriesNumber = text(DCM_SeriesNumber);
+    record.seriesDescription = text(DCM_SeriesDescription);
+    record.modality = text(DCM_Modality);
+    record.seriesDate = text(DCM_SeriesDate);
+    record.seriesTime = text(DCM_SeriesTime);
+    record.stationName = text(DCM_StationName);
+    return record;
+}
+
+}  // namespace Kdd

@@ -1,0 +1,111 @@
+#include "tools/kdd/FileScan.h"
+
+#include "kddlib/tagmodel/TagMap.h"
+#include "platform/base/LogFile.h"
+#include "platform/os/FileStatus.h"
+#include "tools/kdd/Database.h"
+#include "tools/kdd/Progress.h"
+
+#include <deque>
+#include <future>
+#include <thread>
+#include <vector>
+
+namespace Kdd
+{
+
+namespace
+{
+
+/// Files read ahead of the one being handed on, so that reading uses every core.
+constexpr int kFilesPerTask = 16;
+
+std::vector<DicomInput> readSome(const QList<QByteArray>& paths)
+{
+    std::vector<DicomInput> inputs;
+    inputs.reserve(static_cast<std::size_t>(paths.size()));
+    for (const QByteArray& path : paths)
+        inputs.push_back(readDicomInput(path));
+    return inputs;
+}
+
+/// Reads the files on as many threads as there are cores and hands them on in their order.
+bool readAll(const QList<QByteArray>& files, const std::function<bool(DicomInput)>& take)
+{
+    const unsigned ahead = qMax(1U, std::thread::hardware_concurrency());
+    std::deque<std::future<std::vector<DicomInput>>> running;
+    int next = 0;
+    while (next < files.size() || !running.empty()) {
+        while (next < files.size() && running.size() <= ahead) {
+            running.push_back(std::async(std::launch::async, readSome, files.mid(next, kFilesPerTask)));
+            next += kFilesPerTask;
+        }
+        for (DicomInput& input : running.front().get()) {
+            if (!take(std::move(input)))
+                return false;
+        }
+        running.pop_front();
+    }
+    return true;
+}
+
+}  // namespace
+
+bool FileScan::run(const QList<QByteArray>& paths, const std::function<bool(DicomInput)>& take)
+{
+    QList<QByteArray> files;
+    if (!findChanged(paths, files))
+        return false;
+    Progress progress("Reading", !mOptions.quiet);
+    qint64 done = 0;
+    return readAll(files, [&](DicomInput input) {
+        progress.show(++done, files.size());
+        return handOn(std::move(input), take);
+    });
+}
+
+bool FileScan::findChanged(const QList<QByteArray>& paths, QList<QByteArray>& changed)
+{
+    for (const QByteArray& path : paths) {
+        QStringList faults;
+        const QList<QByteArray> files = filesBelow({path}, faults);
+        for (const QString& fault : qAsConst(faults)) {
+            LogFile::errorf("Could not look into %s", qUtf8Printable(fault));
+            ++mFailed;
+        }
+        QHash<QByteArray, Kxg::FileStamp> known;
+        if (!succeeded(mDatabase.knownFiles(absolutePath(path), known)))
+            return false;
+        for (const QByteArray& file : files) {
+            const auto stamp = known.constFind(file);
+            FileStatus status;
+            if (stamp != known.cend() && statusOf(file.constData(), status) && status.size == stamp->size &&
+                status.modified == stamp->modified)
+                ++mUnchanged;
+            else
+                changed.append(file);
+        }
+    }
+    return true;
+}
+
+bool FileScan::handOn(DicomInput input, const std::function<bool(DicomInput)>& take)
+{
+    switch (input.kind) {
+    case DicomInput::Kind::Image:
+    case DicomInput::Kind::Volume:
+        break;
+    case DicomInput::Kind::Other:
+        ++mSkipped;
+        if (mOptions.verbose)
+            LogFile::printf("Skipped %s: %s", input.path.constData(), qUtf8Printable(input.reason));
+        break;
+    case DicomInput::Kind::Unusable:
+        ++mFailed;
+        LogFile::errorf("Could not take %s: %s", input.path.constData(), qUtf8Printable(input.reason));
+        return true;
+    }
+    return take(std::move(input));
+}
+
+}  // namespace Kdd

@@ -1,0 +1,70 @@
+#include "tools/kdd/SampleVolumes.h"
+
+#include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagmodel/TagElement.h"
+#include "kddlib/tagmodel/TagMap.h"
+#include "kddlib/volumes/StackPlanner.h"
+#include "kddlib/volumes/StackWriter.h"
+
+#include <QDir>
+#include <QFileInfo>
+
+namespace Kdd
+{
+
+namespace
+{
+
+const DcmTagKey kFilePath(0x0006, 0x7100);
+
+QByteArray pathOf(const TagMap& image)
+{
+    QByteArray path;
+    image.findAndGetString(kFilePath, path);
+    return path;
+}
+
+void addImages(const QDir& seriesFolder, TagFile& file)
+{
+    for (const QString& name : seriesFolder.entryList({QStringLiteral("*.dcm")}, QDir::Files, QDir::Name)) {
+        const QByteArray path = seriesFolder.filePath(name).toLocal8Bit();
+        if (TagMap* image = file.addDicomFile(path.constData(), path.constData(), false))
+            image->putAndInsertValue(kFilePath, VrCode::LO, path);
+    }
+}
+
+Result stackFolder(const QDir& seriesFolder, int& volumes, qint64& bytes)
+{
+    TagFile file;
+    addImages(seriesFolder, file);
+    for (auto it = file.seriesByUID().cbegin(); it != file.seriesByUID().cend(); ++it) {
+        const StackPlan plan = planStacks(*it.value());
+        for (int i = 0; i < plan.stacks.size(); ++i) {
+            const QString path = seriesFolder.filePath(QString::fromLatin1(volumeFileName(it.key(), i)));
+            const Result result = writeStack(plan.stacks.at(i), pathOf, path.toLocal8Bit());
+            if (result.bad())
+                return result;
+            ++volumes;
+            bytes += QFileInfo(path).size();
+        }
+    }
+    return {};
+}
+
+}  // namespace
+
+Result writeSampleVolumes(const QString& folder, int& volumes, qint64& bytes)
+{
+    const QDir root(folder);
+    for (const QString& study : root.entryList({QStringLiteral("CT-*")}, QDir::Dirs, QDir::Name)) {
+        const QDir studyFolder(root.filePath(study));
+        for (const QString& series : studyFolder.entryList(QDir::Dirs | QDir::NoDotAndDotDot, QDir::Name)) {
+            const Result result = stackFolder(QDir(studyFolder.filePath(series)), volumes, bytes);
+            if (result.bad())
+                return result;
+        }
+    }
+    return {};
+}
+
+}  // namespace Kdd

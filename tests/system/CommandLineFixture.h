@@ -1,0 +1,155 @@
+#pragma once
+
+#include "support/DatasetBuilder.h"
+
+#include <QDir>
+#include <QFile>
+#include <QJsonArray>
+#include <QJsonDocument>
+#include <QJsonObject>
+#include <QProcess>
+#include <QTemporaryDir>
+
+#include <gtest/gtest.h>
+#include <sys/resource.h>
+
+#include <csignal>
+#include <memory>
+
+namespace Kdd
+{
+
+constexpr int kTimeout = 120000;  // [ms]
+constexpr qint64 kNoLimit = -1;
+
+/// The tool as a process, whose files may be kept from growing as by a full disk.
+class Process : public QProcess
+{
+public:
+    explicit Process(qint64 largestFile)
+        : mLargestFile(largestFile)
+    {
+    }
+
+protected:
+    void setupChildProcess() override
+    {
+        if (mLargestFile == kNoLimit)
+            return;
+        ::signal(SIGXFSZ, SIG_IGN);
+        const rlimit limit = {static_cast<rlim_t>(mLargestFile), static_cast<rlim_t>(mLargestFile)};
+        ::setrlimit(RLIMIT_FSIZE, &limit);
+    }
+
+private:
+    qint64 mLargestFile;
+};
+
+struct Answer
+{
+    int exitCode = -1;
+    QByteArray out;
+    QByteArray err;
+
+    QJsonValue json(const char* key) const
+    {
+        return QJsonDocument::fromJson(out).object().value(QLatin1String(key));
+    }
+    int number(const char* key) const { return json(key).toInt(-1); }
+};
+
+/// A store and a folder of images of their own, and the tool that works on them.
+class CommandLine : public testing::Test
+{
+protected:
+    QString images() const { return mFolder.filePath(QStringLiteral("images")); }
+    QString file(const char* name) const { return images() + QLatin1Char('/') + QString::fromUtf8(name); }
+
+    /// Arguments are separated by blanks; `more` follows.
+    std::unique_ptr<Process> start(const char* arguments, const QStringList& more = {},
+                                   qint64 largestFile = kNoLimit) const
+    {
+        auto process = std::make_unique<Process>(largestFile);
+        process->setProgram(QStringLiteral(KDD_BINARY));
+        process->setArguments(
+            QStringList{QStringLiteral("--store"), mFolder.filePath(QStringLiteral("store"))} +
+            QString::fromLatin1(arguments).split(QLatin1Char(' '), Qt::SkipEmptyParts) + more);
+        process->start();
+        return process;
+    }
+
+    static Answer finish(Process& process)
+    {
+        EXPECT_TRUE(process.waitForFinished(kTimeout)) << process.errorString().toStdString();
+        EXPECT_EQ(process.exitStatus(), QProcess::NormalExit);
+        const Answer answer = {process.exitCode(), process.readAllStandardOutput(),
+                               process.readAllStandardError()};
+        EXPECT_FALSE(answer.err.contains("Sanitizer") || answer.err.contains("runtime error"))
+            << answer.err.toStdString();
+        return answer;
+    }
+
+    template <typename... More>
+    Answer kdd(const char* arguments, More... more) const
+    {
+        return finish(*start(arguments, more...));
+    }
+
+    Answer addImages(qint64 largestFile = kNoLimit) const
+    {
+        return kdd("add --json", QStringList{images()}, largestFile);
+    }
+
+    int imagesOf(const char* study) const
+    {
+        return kdd("stat --json", QStringList{QLatin1String(study)}).number("images");
+    }
+
+    void put(const char* name, const QByteArray& content) const
+    {
+        QDir().mkpath(images());
+        QFile target(file(name));
+        ASSERT_TRUE(target.open(QIODevice::WriteOnly));
+        ASSERT_EQ(target.write(content), content.size());
+    }
+
+    void save(const char* name, const DatasetBuilder& image) const
+    {
+        QDir().mkpath(images());
+        DcmFileFormat format(&image.dataset());
+        EXPECT_TRUE(format.saveFile(file(name).toUtf8().constData(), EXS_LittleEndianExplicit).good());
+    }
+
+    QByteArray bytes(const char* name) const
+    {
+        QFile source(file(name));
+        return source.open(QIODevice::ReadOnly) ? source.readAll() : QByteArray();
+    }
+
+    /// Two series of study 1.2 with images 1 and 2, 3; study 1.3 with image 4.
+    void addTwoStudies() const
+    {
+        save("1", anImage("1").with(DCM_PatientName, "Doe^J").withLong(DCM_TextValue, 3000));
+        save("2", anImage("2").inSeries("1.2.4").with(DCM_PatientName, "Doe^J"));
+        save("3", anImage("3").inSeries("1.2.4").with(DCM_PatientName, "Doe^J").with(DCM_Modality, "MR"));
+        save("4", anImage("4").inStudy("1.3").inSeries("1.3.1"));
+        const Answer added = addImages();
+        EXPECT_EQ(added.exitCode, 0);
+        EXPECT_EQ(added.out, "{\"failed\":0,\"images\":4,\"series\":3,\"skipped\":0,\"studies\":2,"
+                             "\"unchanged\":0,\"volumes\":0}\n");
+    }
+
+    /// The UIDs that `list` names.
+    QStringList listedStudies() const
+    {
+        QStringList uids;
+        for (const QJsonValue& study : kdd("list --json").json("studies").toArray())
+            uids.append(study.toObject().value(QLatin1String("study")).toString());
+        uids.sort();
+        return uids;
+    }
+
+    QTemporaryDir mFolder;
+};
+
+}  // namespace Kdd
