@@ -155,11 +155,10 @@ TEST_F(TagFileSyncTest, LabelsTellSeriesApart)
 {
     TagFile labelled;
     const auto addSeries = [&](const char* uid, const char* number, const char* description) {
-        add(labelled, anImage(uid)
-                          .inSeries(uid)
-                          .with(DCM_SeriesNumber, number)
-                          .with(DCM_SeriesDescription, description)
-                          .with(DCM_PixelData, "0"));
+        const DatasetBuilder image = anImage(uid).inSeries(uid);
+        add(labelled,
+            DatasetBuilder(image).with(DCM_SeriesNumber, number).with(DCM_SeriesDescription, description))
+            ->markAsOmitted(DCM_PixelData);
     };
     addSeries("1.1", "3", "axial");
     addSeries("1.2", "3", "axial (1)");

@@ -1,0 +1,89 @@
+// What building a study's tag file from the database costs, beside what it cannot do without: loading the headers of
+// the DICOM files and decoding what the previews show.
+
+#include "bench/Workload.h"
+#include "kddlib/TagFileGenerator.h"
+#include "kddlib/net/DicomFileReader.h"
+#include "kddlib/previews/PreviewGenerator.h"
+#include "platform/database/Catalogue.h"
+#include "platform/database/Kxg.h"
+
+#include <benchmark/benchmark.h>
+#include <dcmtk/dcmdata/dctk.h>
+
+namespace Kdd
+{
+
+namespace
+{
+
+constexpr int kPreviewSize = 256;
+
+/// The workload in a database of its own.
+class RegisteredStudy
+{
+public:
+    RegisteredStudy()
+    {
+        Kxg::SetDatabaseServer("sqlite:" + mFolder.path().toLocal8Bit() + "/database");
+        TagFile::setMetaFolder((mFolder.path() + QStringLiteral("/meta")).toLocal8Bit().constData());
+        Result result;
+        const auto database = Kxg::Catalogue::open(Kxg::DatabaseServer(), result);
+        QMap<QByteArray, qint64> requests;
+        Kxg::FileRecords records;
+        for (const std::string& path : thousandImages().files()) {
+            records.dicom.emplace_back();
+            records.dicom.back().path = QByteArray::fromStdString(path);
+            records.dicom.back().studyInstanceUID = "study";
+        }
+        std::vector<Kxg::StudySummary> studies;
+        if (database == nullptr || database->registerFiles(records, requests).bad() ||
+            database->listStudies(studies).bad())
+            std::abort();
+        mStudyId = studies.front().id;
+    }
+
+    int id() const { return mStudyId; }
+
+private:
+    QTemporaryDir mFolder;
+    int mStudyId = 0;
+};
+
+void loadHeadersAndOnePreview(benchmark::State& state)
+{
+    const std::vector<std::string>& files = thousandImages().files();
+    for (auto step : state) {
+        for (const std::string& path : files) {
+            DcmFileFormat file;
+            file.loadFile(path.c_str());
+            benchmark::DoNotOptimize(file);
+        }
+        DcmFileFormat middle;
+        readDicomFile(files.at(files.size() / 2).c_str(), middle);
+        benchmark::DoNotOptimize(
+            PreviewGenerator::createPreviewImage(middle.getDataset(), kPreviewSize, kPreviewSize, QString()));
+    }
+    state.SetItemsProcessed(static_cast<int64_t>(state.iterations()) * static_cast<int64_t>(files.size()));
+}
+
+/// The study of one long series has one preview.
+void buildStudy(benchmark::State& state)
+{
+    const RegisteredStudy study;
+    for (auto step : state) {
+        if (!TagFileGenerator().createTagFile(study.id()))
+            state.SkipWithError("The study is not built");
+    }
+    state.SetItemsProcessed(static_cast<int64_t>(state.iterations()) *
+                            static_cast<int64_t>(thousandImages().files().size()));
+}
+
+BENCHMARK(loadHeadersAndOnePreview)
+    ->Name("loadHeadersAndOnePreview/1000images")
+    ->Unit(benchmark::kMillisecond);
+BENCHMARK(buildStudy)->Name("buildStudy/1000images")->Unit(benchmark::kMillisecond);
+
+}  // namespace
+
+}  // namespace Kdd
