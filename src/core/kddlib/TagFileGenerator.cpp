@@ -5,6 +5,7 @@
 #include "kddlib/previews/PreviewGenerator.h"
 #include "kddlib/previews/QuadrantNavigation.h"
 #include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/VolumeInfo.h"
@@ -25,9 +26,6 @@ namespace
 {
 
 const char* const kDefaultUser = "zp_administrator";
-
-const DcmTagKey kFilePath(0x0006, 0x7100);
-const DcmTagKey kHasVolumeFile(0x0006, 0x7108);
 
 const char* const kSeriesInstanceUID = "G0020-000E";
 const char* const kModality = "G0008-0060";
@@ -186,8 +184,7 @@ void TagFileGenerator::addPreviews(TagFile& tagFile, const QList<QByteArray>& ch
         TagMap* image = tagFile.findImage(sopUID);
         if (image == nullptr)
             continue;
-        QByteArray path;
-        image->findAndGetString(kFilePath, path);
+        const QByteArray path = filePathOf(*image);
         DcmFileFormat reloaded;
         DcmDataset* dataset = datasets.find(sopUID);
         if (dataset == nullptr && readDicomFile(path.constData(), reloaded).good())

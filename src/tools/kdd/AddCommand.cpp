@@ -1,5 +1,6 @@
 #include "kddlib/TagFileGenerator.h"
 #include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
 #include "tools/kdd/Commands.h"
@@ -21,8 +22,6 @@ namespace Kdd
 
 namespace
 {
-
-const DcmTagKey kFilePath(0x0006, 0x7100);
 
 /// Images held in memory before the studies that got none for the longest time are written.
 constexpr int kMaxPendingImages = 50000;

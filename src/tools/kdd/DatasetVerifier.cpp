@@ -1,7 +1,7 @@
 #include "tools/kdd/DatasetVerifier.h"
 
 #include "kddlib/Limits.h"
-#include "kddlib/tagmodel/PrivateCreator.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/tagmodel/TagSequence.h"
 #include "tools/kdd/AttributeText.h"

@@ -1,6 +1,7 @@
 #include "tools/kdd/SampleVolumes.h"
 
 #include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/StackPlanner.h"
@@ -14,15 +15,6 @@ namespace Kdd
 
 namespace
 {
-
-const DcmTagKey kFilePath(0x0006, 0x7100);
-
-QByteArray pathOf(const TagMap& image)
-{
-    QByteArray path;
-    image.findAndGetString(kFilePath, path);
-    return path;
-}
 
 void addImages(const QDir& seriesFolder, TagFile& file)
 {
@@ -41,7 +33,7 @@ Result stackFolder(const QDir& seriesFolder, int& volumes, qint64& bytes)
         const StackPlan plan = planStacks(*it.value());
         for (int i = 0; i < plan.stacks.size(); ++i) {
             const QString path = seriesFolder.filePath(QString::fromLatin1(volumeFileName(it.key(), i)));
-            const Result result = writeStack(plan.stacks.at(i), pathOf, path.toLocal8Bit());
+            const Result result = writeStack(plan.stacks.at(i), filePathOf, path.toLocal8Bit());
             if (result.bad())
                 return result;
             ++volumes;

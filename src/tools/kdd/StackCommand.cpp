@@ -1,4 +1,5 @@
 #include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/StackPlanner.h"
 #include "kddlib/volumes/StackWriter.h"
@@ -21,15 +22,6 @@ namespace Kdd
 
 namespace
 {
-
-const DcmTagKey kFilePath(0x0006, 0x7100);
-
-QByteArray pathOf(const TagMap& image)
-{
-    QByteArray path;
-    image.findAndGetString(kFilePath, path);
-    return path;
-}
 
 /// What is told of one series.
 struct StackedSeries
@@ -139,7 +131,7 @@ bool StudyStacker::writeVolume(const QByteArray& seriesUID, const Stack& stack, 
     }
     const QByteArray path = volumePath(seriesUID, index);
     FileStatus status;
-    if (!succeeded(writeStack(stack, pathOf, path)) || !statusOf(path.constData(), status))
+    if (!succeeded(writeStack(stack, filePathOf, path)) || !statusOf(path.constData(), status))
         return false;
     mMade.volumes.push_back({path, {status.size, status.modified}, mStudyUID, seriesUID});
     return true;

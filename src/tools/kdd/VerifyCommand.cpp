@@ -1,4 +1,5 @@
 #include "kddlib/net/DicomFileReader.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
 #include "tools/kdd/Commands.h"
@@ -17,8 +18,6 @@ namespace Kdd
 namespace
 {
 
-const DcmTagKey kFilePath(0x0006, 0x7100);
-
 struct Findings
 {
     int studies = 0;
@@ -29,8 +28,7 @@ struct Findings
 
 void verifyImage(const QByteArray& key, const TagMap& image, Findings& findings)
 {
-    QByteArray path;
-    image.findAndGetString(kFilePath, path);
+    const QByteArray path = filePathOf(image);
     DcmFileFormat file;
     const OFCondition condition = readDicomFile(path.constData(), file);
     if (condition.bad()) {

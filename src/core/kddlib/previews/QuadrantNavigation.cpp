@@ -1,7 +1,7 @@
 #include "kddlib/previews/QuadrantNavigation.h"
 
 #include "kddlib/previews/BreastRegion.h"
-#include "kddlib/tagmodel/PrivateCreator.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/volumefile/ParamBundle.h"

@@ -1,3 +1,4 @@
+#include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/Volume.h"
@@ -11,8 +12,6 @@ namespace Kdd
 
 namespace
 {
-
-const DcmTagKey kPreview(0x0006, 0x7105);
 
 QByteArray previewOf(const TagMap& node)
 {

@@ -3,6 +3,7 @@
 #include "kddlib/Limits.h"
 #include "kddlib/items/FileNaming.h"
 #include "kddlib/net/DicomFileReader.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
@@ -16,14 +17,6 @@
 
 namespace Kdd
 {
-
-namespace
-{
-
-const DcmTagKey kFilePath(0x0006, 0x7100);
-const DcmTagKey kSuffix(0x0006, 0x7101);
-
-}  // namespace
 
 TagFile::CompressionMode TagFile::sCompressionMode = CompressionMode::Zlib;
 Vec2i TagFile::sPreviewSize = {256, 256};
@@ -59,12 +52,8 @@ void TagFile::setMetaFolder(const char* path)
 /// The name under which an image is indexed: its SOP Instance UID, and where it has none its file path.
 QByteArray TagFile::imageKey(const TagMap& image)
 {
-    QByteArray sopUID = image.uid(TagMap::ImageLevel);
-    if (!sopUID.isEmpty())
-        return sopUID;
-    QByteArray path;
-    image.findAndGetString(kFilePath, path);
-    return path;
+    const QByteArray sopUID = image.uid(TagMap::ImageLevel);
+    return sopUID.isEmpty() ? filePathOf(image) : sopUID;
 }
 
 TagMap* TagFile::addTagMap(TagMap* map, const char* path, bool replace)
@@ -86,7 +75,7 @@ TagMap* TagFile::addTagMap(TagMap* map, const char* path, bool replace)
     mImages.insert(key, image.get());
     placeInSeries(image.get(), seriesUID, studyUID);
     if (path != nullptr)
-        image->putAndInsertValue(kSuffix, VrCode::LO, extractSuffix(path));
+        image->putAndInsertValue(kFileSuffix, VrCode::LO, extractSuffix(path));
     if (isKnownByPath)
         image->putAndInsertValue(kFilePath, VrCode::LO, path);
     return image.release();
@@ -146,7 +135,7 @@ TagMap* TagFile::findImage(const QByteArray& sopUID, const QByteArray& suffix) c
     TagMap* image = findImage(sopUID);
     if (image == nullptr || suffix.isEmpty())
         return image;
-    const TagElement* held = image->findElement(kSuffix);
+    const TagElement* held = image->findElement(kFileSuffix);
     return held == nullptr || held->value() == suffix ? image : nullptr;
 }
 

@@ -1,4 +1,5 @@
 #include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/Volume.h"
@@ -18,10 +19,6 @@ namespace Kdd
 
 namespace
 {
-
-const DcmTagKey kFilePath(0x0006, 0x7100);
-const DcmTagKey kFromDatabase(0x0006, 0x7107);
-const DcmTagKey kAbstract(0x0006, 0x7120);
 
 const char* const kPart = "_part";
 

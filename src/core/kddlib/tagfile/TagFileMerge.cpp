@@ -1,4 +1,5 @@
 #include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
 #include "platform/os/ExclusiveFile.h"
@@ -19,9 +20,6 @@ namespace
 const char* const kCategory = "TagMerge";
 
 constexpr LockPolling kMergePolling{100, 20};
-
-const DcmTagKey kVolumeIndex(0x0006, 0x7103);
-const DcmTagKey kAbstract(0x0006, 0x7120);
 
 bool isLabelled(const TagMap* series)
 {

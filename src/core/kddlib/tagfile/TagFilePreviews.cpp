@@ -2,6 +2,7 @@
 #include "kddlib/previews/PreviewGenerator.h"
 #include "kddlib/previews/QuadrantNavigation.h"
 #include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/Volume.h"
@@ -24,9 +25,6 @@ namespace Kdd
 
 namespace
 {
-
-const DcmTagKey kVolumeIndex(0x0006, 0x7103);
-const DcmTagKey kPreview(0x0006, 0x7105);
 
 constexpr int kLongSeries = 20;
 constexpr int kHashBytes = 4;

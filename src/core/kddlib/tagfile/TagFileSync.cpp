@@ -1,4 +1,5 @@
 #include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/Volume.h"
@@ -21,8 +22,6 @@ namespace
 const char* const kCategory = "kdd";
 
 constexpr int kMaxSeries = 1000;
-
-const DcmTagKey kFilePath(0x0006, 0x7100);
 
 /// Asks for the images of a study's series while the caller does something else.
 class SeriesQuery
@@ -74,13 +73,6 @@ private:
 QByteArray forwardSlashes(QByteArray path)
 {
     return path.replace('\\', '/');
-}
-
-QByteArray pathOf(const TagMap& image)
-{
-    QByteArray path;
-    image.findAndGetString(kFilePath, path);
-    return path;
 }
 
 QVector<QByteArray> volumeNames(const TagMap& series)
@@ -174,7 +166,7 @@ bool TagFile::syncImages(TagMap& series, const Kxg::SeriesInfo& info)
     for (const Kxg::ImageFile& file : info.images) {
         const TagMap* image = findImage(file);
         known.insert(image);
-        isChanged = isChanged || (image != nullptr && pathOf(*image) != forwardSlashes(file.path));
+        isChanged = isChanged || (image != nullptr && filePathOf(*image) != forwardSlashes(file.path));
     }
     // A path that an image brought along from the building of the file says nothing of what the database knows.
     for (TagMap* image : series.children()) {

@@ -1,5 +1,6 @@
 #include "kddlib/previews/QuadrantNavigation.h"
 #include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/Volume.h"
@@ -18,8 +19,6 @@ namespace
 {
 
 const char* const kCategory = "TagFile";
-
-const DcmTagKey kVolumeIndex(0x0006, 0x7103);
 
 /// Names the volume in one of its images: the index as one byte, further volumes appended as one byte each.
 void addVolumeIndex(TagMap& image, int index)

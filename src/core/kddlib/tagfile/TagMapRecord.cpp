@@ -1,4 +1,5 @@
 #include "kddlib/Limits.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/tagmodel/TagSequence.h"
 #include "platform/base/KxMsg.h"
@@ -13,9 +14,6 @@ namespace
 
 constexpr int kLengthEscape = 65535;
 constexpr int kShortLength = 2;
-
-const DcmTagKey kPreview(0x0006, 0x7105);
-const DcmTagKey kPreviewIndex(0x0006, 0x7106);
 
 /// Writes what `write` appends as a record behind its length. The record goes straight to its place; only one that
 /// outgrows the short length code is moved.

@@ -1,4 +1,5 @@
 #include "kddlib/Limits.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/Volume.h"
@@ -23,8 +24,6 @@ constexpr int kMinRecord = 2 + 12 + 24 + 64 + 2 + 1 + 2;
 constexpr quint8 kExtraVersion = 0;
 constexpr int kMaxShort = 0xFFFF;
 constexpr int kMaxByte = 0xFF;
-
-const DcmTagKey kVolumeIndex(0x0006, 0x7103);
 
 /// How the slices are stored.
 enum class SliceCode : quint8 {

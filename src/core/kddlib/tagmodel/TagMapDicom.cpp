@@ -1,4 +1,5 @@
 #include "kddlib/Limits.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/tagmodel/TagSequence.h"
 #include "platform/base/LogFile.h"
@@ -17,8 +18,6 @@ namespace Kdd
 
 namespace
 {
-
-const DcmTagKey kTransferSyntax(0x0006, 0x7102);
 
 bool isRepeatingGroup(const DcmTagKey& key, Uint16 first)
 {

@@ -1,0 +1,15 @@
+#include "kddlib/tagmodel/OwnAttributes.h"
+
+#include "kddlib/tagmodel/TagMap.h"
+
+namespace Kdd
+{
+
+QByteArray filePathOf(const TagMap& image)
+{
+    QByteArray path;
+    image.findAndGetString(kFilePath, path);
+    return path;
+}
+
+}  // namespace Kdd
