@@ -7,7 +7,7 @@
 using namespace Kdd;
 
 // The HDF5 library loses some memory with every damaged object header.
-extern "C" const char* __lsan_default_suppressions()
+extern "C" __attribute__((visibility("default"))) const char* __lsan_default_suppressions()
 {
     return "leak:libhdf5";
 }

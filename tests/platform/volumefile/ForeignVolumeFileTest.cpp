@@ -11,7 +11,7 @@
 using namespace Kdd;
 
 // The library itself loses some memory with every damaged object header. What we leave open is counted below.
-extern "C" const char* __lsan_default_suppressions()
+extern "C" __attribute__((visibility("default"))) const char* __lsan_default_suppressions()
 {
     return "leak:libhdf5";
 }
