@@ -89,7 +89,7 @@ private:
     bool place(DicomInput& input);
     bool write(Pending::iterator study);
     bool writeClaimed(Kxg::StudyClaim& claim, TagFile& file);
-    bool merge(TagFile& file);
+    static bool merge(TagFile& file);
     bool writeLongestUntouched();
     void count(const QByteArray& studyUID, const TagFile& file);
     StudyTotals sum() const;

@@ -172,6 +172,7 @@ Outcome runBuild(const GlobalOptions& options, const BuildRequest& request)
     {
         Builders builders(options, request, named.isEmpty() ? expected : named.size());
         std::vector<std::thread> workers;
+        workers.reserve(static_cast<std::size_t>(request.jobs));
         for (int i = 0; i < request.jobs; ++i)
             workers.emplace_back([&] { builders.work(named); });
         for (std::thread& worker : workers)

@@ -33,7 +33,7 @@ Result stackFolder(const QDir& seriesFolder, int& volumes, qint64& bytes)
         const StackPlan plan = planStacks(*it.value());
         for (int i = 0; i < plan.stacks.size(); ++i) {
             const QString path = seriesFolder.filePath(QString::fromLatin1(volumeFileName(it.key(), i)));
-            const Result result = writeStack(plan.stacks.at(i), filePathOf, path.toLocal8Bit());
+            Result result = writeStack(plan.stacks.at(i), filePathOf, path.toLocal8Bit());
             if (result.bad())
                 return result;
             ++volumes;
@@ -51,7 +51,7 @@ Result writeSampleVolumes(const QString& folder, int& volumes, qint64& bytes)
     for (const QString& study : root.entryList({QStringLiteral("CT-*")}, QDir::Dirs, QDir::Name)) {
         const QDir studyFolder(root.filePath(study));
         for (const QString& series : studyFolder.entryList(QDir::Dirs | QDir::NoDotAndDotDot, QDir::Name)) {
-            const Result result = stackFolder(QDir(studyFolder.filePath(series)), volumes, bytes);
+            Result result = stackFolder(QDir(studyFolder.filePath(series)), volumes, bytes);
             if (result.bad())
                 return result;
         }

@@ -16,6 +16,7 @@
 #include <QJsonArray>
 
 #include <cstdio>
+#include <utility>
 
 namespace Kdd
 {
@@ -36,9 +37,9 @@ struct StackedSeries
 class StudyStacker
 {
 public:
-    StudyStacker(Kxg::Catalogue& database, const QString& folder, bool again)
+    StudyStacker(Kxg::Catalogue& database, QString folder, bool again)
         : mDatabase(database)
-        , mFolder(folder)
+        , mFolder(std::move(folder))
         , mAgain(again)
     {
     }

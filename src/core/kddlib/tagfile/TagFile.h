@@ -209,11 +209,11 @@ public:
 
     /// Gives the volume that a volume file's name stands for that name; `createMissing` makes the volume first. Other
     /// entries change nothing.
-    void addVolumeFilePath(TagMap* series, const Kxg::DicomDirectoryEntry& entry, bool createMissing);
+    static void addVolumeFilePath(TagMap* series, const Kxg::DicomDirectoryEntry& entry, bool createMissing);
 
     /// Marks the study as known to the database, and adds an empty series for each one that only the database has but
     /// for reports, presentation states and segmentations. What the tree knows already stays as it is.
-    void copyDatabaseValuesIntoTagMap(const Kxg::DicomDirectoryEntry& study);
+    void copyDatabaseValuesIntoTagMap(const Kxg::DicomDirectoryEntry& entry);
 
     /// Gives every series a label (0006,7120) that no other series of the study has.
     void createAbstractTags();

@@ -20,12 +20,17 @@ int factorFor(int size, int limit)
     return std::max(size, 0) / (limit + 1) + 1;
 }
 
-void reduceAxis(int dims, int lowResDims, int factor, float minimum, float maximum, float& lowMinimum,
-                float& lowMaximum)
+struct Limits
 {
-    const float voxel = dims >= 2 ? (maximum - minimum) / static_cast<float>(dims - 1) : 0;
-    lowMinimum = minimum + static_cast<float>(factor - 1) * (voxel * 0.5F);
-    lowMaximum = lowMinimum + static_cast<float>(lowResDims - 1) * voxel * static_cast<float>(factor);
+    float minimum;
+    float maximum;
+};
+
+Limits reduced(int dims, int lowResDims, int factor, const Limits& limits)
+{
+    const float voxel = dims >= 2 ? (limits.maximum - limits.minimum) / static_cast<float>(dims - 1) : 0;
+    const float minimum = limits.minimum + static_cast<float>(factor - 1) * (voxel * 0.5F);
+    return {minimum, minimum + static_cast<float>(lowResDims - 1) * voxel * static_cast<float>(factor)};
 }
 
 }  // namespace
@@ -43,10 +48,10 @@ bool computeLowResSize(const int* dims, int* lowResDims, int* factors)
 void computeLowResBox(const int* dims, const int* lowResDims, const int* factors, const Box3f& box,
                       Box3f& lowResBox)
 {
-    const Box3f from = box;  // the caller may reduce a box in place
-    reduceAxis(dims[0], lowResDims[0], factors[0], from.xmin, from.xmax, lowResBox.xmin, lowResBox.xmax);
-    reduceAxis(dims[1], lowResDims[1], factors[1], from.ymin, from.ymax, lowResBox.ymin, lowResBox.ymax);
-    reduceAxis(dims[2], lowResDims[2], factors[2], from.zmin, from.zmax, lowResBox.zmin, lowResBox.zmax);
+    const Limits x = reduced(dims[0], lowResDims[0], factors[0], {box.xmin, box.xmax});
+    const Limits y = reduced(dims[1], lowResDims[1], factors[1], {box.ymin, box.ymax});
+    const Limits z = reduced(dims[2], lowResDims[2], factors[2], {box.zmin, box.zmax});
+    lowResBox = {x.minimum, x.maximum, y.minimum, y.maximum, z.minimum, z.maximum};
 }
 
 }  // namespace Kdd
