@@ -8,7 +8,6 @@
 
 #include <QHash>
 
-#include <algorithm>
 #include <set>
 
 namespace Kxg
@@ -70,12 +69,12 @@ DicomDirectoryEntry volumeEntry(const DicomDirectoryEntry& series, const QByteAr
     return file;
 }
 
-void readSeries(SqlConnection& connection, qint64 studyId, int limit, DicomDirectoryEntry& study)
+void readSeries(SqlConnection& connection, qint64 studyId, DicomDirectoryEntry& study)
 {
     SqlRows rows =
         connection.ask("SELECT uid, series_number, series_description, modality, series_date, series_time,"
-                       " station_name FROM series WHERE study_id = ? ORDER BY uid LIMIT ?",
-                       {studyId, std::max(0, limit)});
+                       " station_name FROM series WHERE study_id = ? ORDER BY uid",
+                       {studyId});
     while (rows.next())
         study.entries.push_back(seriesEntry(rows, study.studyInstanceUID));
 }
@@ -111,7 +110,7 @@ Kdd::Result GetAllFilesOfStudy(const QByteArray& user, int studyId, std::vector<
     });
 }
 
-Kdd::Result GetStudy(const QByteArray& studyUID, int limit, std::shared_ptr<DicomDirectoryEntry>& study)
+Kdd::Result GetStudy(const QByteArray& studyUID, std::shared_ptr<DicomDirectoryEntry>& study)
 {
     study.reset();
     return askDatabase([&](SqlConnection& connection) {
@@ -120,7 +119,7 @@ Kdd::Result GetStudy(const QByteArray& studyUID, int limit, std::shared_ptr<Dico
             return;
         const auto entry = std::make_shared<DicomDirectoryEntry>();
         entry->studyInstanceUID = studyUID;
-        readSeries(connection, studyId, limit, *entry);
+        readSeries(connection, studyId, *entry);
         readVolumes(connection, studyId, *entry);
         study = entry;
     });

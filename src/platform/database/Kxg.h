@@ -32,10 +32,8 @@ KDD_EXPORT Kdd::Result GetAllFilesOfStudy(const QByteArray& user, int studyId,
                                           std::vector<std::string>& volumeFiles,
                                           std::vector<std::string>& seriesUIDs);
 
-/// A study with its series and their volume files; null in `study` when there is none of that UID. At most `limit`
-/// series come back.
-KDD_EXPORT Kdd::Result GetStudy(const QByteArray& studyUID, int limit,
-                                std::shared_ptr<DicomDirectoryEntry>& study);
+/// A study with all its series and their volume files; null in `study` when there is none of that UID.
+KDD_EXPORT Kdd::Result GetStudy(const QByteArray& studyUID, std::shared_ptr<DicomDirectoryEntry>& study);
 
 /// The images of every series of a study, by Series Instance UID.
 KDD_EXPORT Kdd::Result GetSeries(const QByteArray& studyUID,

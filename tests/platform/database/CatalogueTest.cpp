@@ -16,7 +16,7 @@ protected:
     {
         QByteArray text;
         std::shared_ptr<DicomDirectoryEntry> study;
-        EXPECT_EQ(GetStudy(studyUID, 1000, study).text().toStdString(), "");
+        EXPECT_EQ(GetStudy(studyUID, study).text().toStdString(), "");
         if (!study)
             return "none";
         for (const auto& series : study->entries) {

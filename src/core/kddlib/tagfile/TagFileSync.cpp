@@ -21,8 +21,6 @@ namespace
 
 const char* const kCategory = "kdd";
 
-constexpr int kMaxSeries = 1000;
-
 /// Asks for the images of a study's series while the caller does something else.
 class SeriesQuery
 {
@@ -91,7 +89,7 @@ bool TagFile::readAndSync(const char* studyUID, const char* /*user*/)
     if (result.bad())
         LogFile::warnf("%s", qUtf8Printable(result.text()));
     std::shared_ptr<Kxg::DicomDirectoryEntry> study;
-    result = Kxg::GetStudy(studyUID, kMaxSeries, study);
+    result = Kxg::GetStudy(studyUID, study);
     if (result.bad()) {
         LogFile::errorf("%s", qUtf8Printable(result.text()));
         return false;
