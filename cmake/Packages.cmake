@@ -2,6 +2,8 @@
 find_package(DCMTK CONFIG REQUIRED)
 find_package(Qt5 REQUIRED COMPONENTS Core Gui Sql)
 find_package(HDF5 REQUIRED COMPONENTS C HL)
+find_package(CURL REQUIRED)
+find_package(OpenSSL REQUIRED)
 find_package(LibLZMA REQUIRED)
 find_package(Boost REQUIRED)
 find_package(spdlog REQUIRED)

@@ -31,6 +31,9 @@ constexpr Setting kCloudToken = {"KDD_CLOUD_TOKEN", "cloud/token", "https://oaut
 constexpr Setting kDatabase = {"KDD_DATABASE", "database/address", ""};
 constexpr Setting kMetaFolder = {"KDD_META_FOLDER", "folders/meta", ""};
 constexpr Setting kFileCacheFolder = {"KDD_FILE_CACHE", "folders/filecache", ""};
+constexpr Setting kTlsVerify = {"KDD_TLS_VERIFY", "tls/verify", "0"};
+constexpr Setting kTlsCaFile = {"KDD_TLS_CA_FILE", "tls/cafile", ""};
+constexpr Setting kShareConnections = {"KDD_SHARE_CONNECTIONS", "web/shareconnections", "1"};
 
 using Values = QHash<QString, QByteArray>;
 
@@ -118,6 +121,21 @@ QByteArray ExResource::metaFolder()
 QByteArray ExResource::fileCacheFolder()
 {
     return valueOf(kFileCacheFolder);
+}
+
+bool ExResource::verifiesTls()
+{
+    return valueOf(kTlsVerify) != "0";
+}
+
+QByteArray ExResource::tlsCaFile()
+{
+    return valueOf(kTlsCaFile);
+}
+
+bool ExResource::sharesConnections()
+{
+    return valueOf(kShareConnections) != "0";
 }
 
 }  // namespace Kdd

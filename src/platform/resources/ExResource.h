@@ -43,6 +43,18 @@ public:
 
     /// Folder of the file cache. KDD_FILE_CACHE, folders/filecache, empty: there is no file cache.
     static QByteArray fileCacheFolder();
+
+    /// Whether servers must prove who they are when they are reached over TLS: not when the value is 0, so that a
+    /// misspelt one errs on the safe side. KDD_TLS_VERIFY, tls/verify, "0".
+    static bool verifiesTls();
+
+    /// File with the certificates, in PEM, that such a proof may rest on. KDD_TLS_CA_FILE, tls/cafile, empty: those
+    /// that the system trusts.
+    static QByteArray tlsCaFile();
+
+    /// Whether all threads use one set of connections: not when the value is 0. KDD_SHARE_CONNECTIONS,
+    /// web/shareconnections, "1".
+    static bool sharesConnections();
 };
 
 }  // namespace Kdd

@@ -1,0 +1,26 @@
+#pragma once
+
+#include "platform/base/Export.h"
+
+#include <exception>
+#include <string>
+
+namespace Kdd
+{
+
+/// A request that could not be set up or carried out.
+class KDD_EXPORT CurlError : public std::exception
+{
+public:
+    /// `code` is the CURLcode, `description` what curl wrote into the request's error buffer, if anything.
+    explicit CurlError(int code, const char* description = nullptr);
+
+    /// "Error code: " and curl's text for the code; on a line of its own "Error description: " and the description
+    /// when there is one; and, when the two sides have no cipher in common, a line with the cure.
+    const char* what() const noexcept override { return mMessage.c_str(); }
+
+private:
+    std::string mMessage;
+};
+
+}  // namespace Kdd

@@ -1,0 +1,91 @@
+#pragma once
+
+#include "platform/base/Export.h"
+
+#include <QByteArray>
+
+#include <functional>
+#include <string>
+
+class QJsonDocument;
+class QJsonObject;
+
+namespace Kdd
+{
+
+struct KxHttpStatus;
+
+/// The one way by which the library reads and writes over HTTP and HTTPS.
+///
+/// It keeps what all requests have in common: settings, idle handles, and the caches that spare a request the search
+/// for the server, the connection and the handshake. An address is a URL of HTTP or HTTPS, to which the session's id
+/// is added, or "gs:" and any number of "/", bucket, "/", object, which goes to the cloud storage.
+///
+/// A copy acts on the same state. Any thread may use it. Settings may be changed at any time and hold for requests
+/// that begin afterwards. Certificates are checked only when the site's settings ask for it (KDD_TLS_VERIFY).
+///
+/// The operations that send something throw CurlError when a request cannot be set up; std::runtime_error "Failed to
+/// add curl request header" when a header line is not to be had or would be several lines. A transfer that breaks off
+/// throws nothing: the trace log has the reason, the status counts as failed, and what has arrived is returned.
+/// Codes of the server are never faults: the status has them, and the body is what the server sent with them.
+class KDD_EXPORT KxCurlClient
+{
+public:
+    /// The client of the process, made on the first call and never destroyed.
+    static KxCurlClient& instance();
+
+    /// Whether a name is to be fetched rather than opened: begins with "http" or "gs". False for null.
+    static bool isUrl(const char* name);
+
+    /// The URL of a path of the own web service; nothing is escaped.
+    static std::string url(const std::string& path);
+
+    /// Sent as the query's "s" to all but the cloud storage, unescaped; empty: not at all.
+    std::string sessionID() const;
+    void setSessionID(const std::string& id);
+
+    /// How an object is fetched in ranges: the length of each [bytes], and how many at a time; below 2 it is fetched
+    /// in one piece.
+    int chunkSizeForPartialRequests() const;
+    void setChunkSizeForPartialRequests(int bytes);
+    int numConcurrentRequestsPerFile() const;
+    void setNumConcurrentRequestsPerFile(int count);
+
+    /// Connections that streams which begin afterwards leave open at least.
+    int maxConnects() const;
+    void setMaxConnects(int count);
+
+    /// Who is asked for the header line "Authorization: ..." of each request to the cloud storage; an empty line means
+    /// that there is none, and the request goes out without. Called on the thread of the request. What it throws
+    /// passes to the caller of the request.
+    using Authorization = std::function<std::string()>;
+    void setAuthorization(const Authorization& authorization);
+
+    /// The whole body, which may be up to 1 GiB; a longer one breaks off there.
+    QByteArray readBytes(const std::string& url, KxHttpStatus& status);
+
+    /// The body as JSON; a null document when it is none.
+    QJsonDocument readJson(const std::string& url, KxHttpStatus& status);
+
+    /// Sends a body, also an empty one, and returns the answer as JSON; a null document when it is none.
+    QJsonDocument postBytes(const std::string& url, const QByteArray& body, const std::string& contentType,
+                            KxHttpStatus& status);
+
+    /// The same with the type "application/octet-stream".
+    QJsonDocument postBytes(const std::string& url, const QByteArray& body, KxHttpStatus& status);
+
+    /// The same with the object, indented, as "application/json".
+    QJsonDocument postJson(const std::string& url, const QJsonObject& object, KxHttpStatus& status);
+
+    /// Deletes an object of the cloud storage: whether the storage says so. Any other address is left alone, and the
+    /// answer is true. CurlError also when the transfer breaks off.
+    bool deleteObject(const std::string& url);
+
+private:
+    struct Private;
+    KxCurlClient();
+
+    Private* mPrivate;  // lives as long as the process
+};
+
+}  // namespace Kdd

@@ -1,0 +1,70 @@
+#pragma once
+
+#include <curl/curl.h>
+
+#include <cstddef>
+#include <memory>
+#include <mutex>
+#include <string>
+#include <vector>
+
+namespace Kdd
+{
+
+struct CurlEasyCleanup
+{
+    void operator()(CURL* handle) const { curl_easy_cleanup(handle); }
+};
+struct CurlMultiCleanup
+{
+    void operator()(CURLM* handle) const { curl_multi_cleanup(handle); }
+};
+using CurlEasy = std::unique_ptr<CURL, CurlEasyCleanup>;
+using CurlMulti = std::unique_ptr<CURLM, CurlMultiCleanup>;
+
+/// Keeps curl handles between requests, because making one costs memory and its connections go with it.
+///
+/// Any thread may use it.
+class KxCurlHandleFactory
+{
+public:
+    /// Keeps up to `capacity` idle handles of each kind, at least one. The cipher list is taken from the environment
+    /// variable SSL_CIPHER_LIST where that is set, be it empty.
+    explicit KxCurlHandleFactory(std::size_t capacity);
+
+    /// A handle without options, idle or new. std::bad_alloc when curl cannot make one.
+    CurlEasy takeEasy();
+
+    /// Clears all options at once, so that the handle keeps no pointer into a request that is gone. When the pool is
+    /// full the handle that was idle for longest is cleaned up.
+    void giveBack(CurlEasy handle);
+
+    /// An idle multi handle while easy handles are idle as well, else a new one.
+    CurlMulti takeMulti();
+
+    /// All easy handles must have been removed from it.
+    void giveBack(CurlMulti handle);
+
+    /// TLS ciphers up to TLS 1.2 in OpenSSL's form; empty leaves the choice to the TLS library.
+    const std::string& cipherList() const { return mCipherList; }
+
+    /// Connections that a multi handle made from now on keeps open.
+    int maxConnects() const;
+    void setMaxConnects(int count);
+
+    /// How many open connections a transfer leaves at its end: `maxConnects`, but never fewer than handles are kept.
+    /// The connections are shared, and a transfer that ends trims all threads' connections to its own limit.
+    long connectionLimit() const;
+
+private:
+    long connectionLimitLocked() const;
+
+    const std::size_t mCapacity;
+    mutable std::mutex mMutex;
+    std::vector<CurlEasy> mEasy;
+    std::vector<CurlMulti> mMulti;
+    std::string mCipherList;
+    int mMaxConnects = 8;
+};
+
+}  // namespace Kdd

@@ -1,0 +1,48 @@
+#pragma once
+
+#include <QByteArray>
+
+#include <functional>
+#include <string>
+#include <vector>
+
+namespace Kdd
+{
+
+/// What a client's requests follow; a request takes a copy when it is prepared.
+struct ClientSettings
+{
+    std::string sessionId;
+    int numConcurrentRequestsPerFile = 1;
+    int chunkSizeForPartialRequests = 12 * 1024 * 1024;  // [bytes]
+
+    /// Gives the header line "Authorization: ..." for the cloud storage, or nothing. May be empty itself.
+    std::function<std::string()> authorization;
+};
+
+/// A request as it goes out: where to and with which header lines.
+struct PreparedRequest
+{
+    std::string url;
+    std::vector<std::string> headers;
+};
+
+/// Whether a request has a body. It decides which host of the cloud storage is asked.
+enum class RequestBody { None, Sent };
+
+/// Makes the address that a caller gave into a URL and adds what the address asks for to the caller's header lines:
+/// for the cloud storage authorisation, when there is one, for all else the session's id. Passes on what the
+/// authorisation throws.
+PreparedRequest prepareRequest(const std::string& address, std::vector<std::string> headers, RequestBody body,
+                               const ClientSettings& settings);
+
+/// What the settings' authorisation gives; empty without one.
+std::string authorizationHeader(const ClientSettings& settings);
+
+/// The header lines that requests to the cloud storage carry along with `authorization`.
+std::vector<std::string> cloudHeaders(const std::string& authorization);
+
+/// The last byte (0-based) of the first range when an object is fetched in several; -1 when in one piece.
+qint64 lastByteOfFirstRange(const ClientSettings& settings);
+
+}  // namespace Kdd

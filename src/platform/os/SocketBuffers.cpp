@@ -1,0 +1,14 @@
+#include "platform/os/SocketBuffers.h"
+
+#include <sys/socket.h>
+
+namespace Kdd
+{
+
+void setSocketBuffers(int socket, int bytes)
+{
+    ::setsockopt(socket, SOL_SOCKET, SO_RCVBUF, &bytes, sizeof bytes);
+    ::setsockopt(socket, SOL_SOCKET, SO_SNDBUF, &bytes, sizeof bytes);
+}
+
+}  // namespace Kdd

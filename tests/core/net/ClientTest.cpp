@@ -1,0 +1,133 @@
+#include "kddlib/net/CurlError.h"
+#include "kddlib/net/CurlShare.h"
+#include "kddlib/net/KxCurlClient.h"
+#include "kddlib/net/KxCurlRequest.h"
+#include "support/HttpServer.h"
+
+#include <QJsonDocument>
+#include <QJsonObject>
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+using namespace Kdd;
+using testing::EndsWith;
+using testing::HasSubstr;
+using testing::StartsWith;
+
+namespace
+{
+
+class Client : public testing::Test
+{
+protected:
+    ~Client() override
+    {
+        client.setSessionID({});
+        client.setAuthorization({});
+        qunsetenv("KDD_CLOUD_API");
+    }
+
+    std::string lastRequest() const { return server.requests().back().toStdString(); }
+
+    KxCurlClient& client = KxCurlClient::instance();
+    KxHttpStatus status;
+    ScriptedServer server{[](const QByteArray&) -> ScriptedServer::Reply {
+        return {
+            "HTTP/1.1 103 Early Hints\r\n\r\nHTTP/1.1 200 OK\r\nX-Two:  b \r\nX-TWO:c: d\r\n\r\n{\"a\": 1}"};
+    }};
+};
+
+TEST_F(Client, ReadsABodyOfAnyLengthAndKeepsTheConnection)
+{
+    NginxServer nginx(NginxServer::Scheme::Http, "location = /connection { return 200 $connection; }"
+                                                 "location /chunked/ { alias files/; ssi on; ssi_types *; }");
+    const QByteArray big(3'000'001, 'x');
+    nginx.addFile("big", big);
+    const QByteArray connection = client.readBytes(nginx.url("connection"), status);
+    EXPECT_EQ(client.readBytes(nginx.url("big"), status), big);
+    EXPECT_TRUE(status.ok());
+    EXPECT_EQ(status.bytesReceived, quint64(big.size()));
+    EXPECT_EQ(status.headers.at("content-length"), "3000001");
+    EXPECT_EQ(client.readBytes(nginx.url("chunked/big"), status), big);
+    EXPECT_EQ(status.headers.at("transfer-encoding"), "chunked");
+    EXPECT_EQ(client.readBytes(nginx.url("connection"), status), connection);
+    EXPECT_THAT(client.readBytes(nginx.url("absent"), status).toStdString(), HasSubstr("404 Not Found"));
+    EXPECT_EQ(status.code, 404);
+    EXPECT_FALSE(status.ok() || status.failed);
+}
+
+TEST_F(Client, KeepsHeadersByNameAndTheCodeOfTheFinalAnswer)
+{
+    client.setSessionID("12");
+    EXPECT_EQ(client.readJson(server.url("j"), status).object()[QStringLiteral("a")], 1);
+    EXPECT_EQ(status.code, 200);
+    EXPECT_EQ(status.headers.at("x-two"), "c: d");
+    EXPECT_EQ(status.headers.at("http/1.1 200 ok"), "");
+    EXPECT_THAT(lastRequest(), StartsWith("GET /j?s=12 HTTP/1.1\r\n"));
+    EXPECT_THAT(lastRequest(), HasSubstr("\r\nUser-Agent: Korvex kddlib "));
+}
+
+TEST_F(Client, PostsBytesWithTheirTypeAndReadsTheAnswer)
+{
+    const QByteArray large(2'000'000, 'y');  // for which curl would ask leave first
+    EXPECT_EQ(client.postBytes(server.url("p"), large, "text/plain", status).object().size(), 1);
+    EXPECT_THAT(lastRequest(), StartsWith("POST /p HTTP/1.1\r\n"));
+    EXPECT_THAT(lastRequest(), HasSubstr("\r\nContent-Type: text/plain\r\n"));
+    EXPECT_THAT(lastRequest(), Not(HasSubstr("Expect:")));
+    EXPECT_TRUE(server.requests().back().endsWith("\r\n\r\n" + large));
+    client.postBytes(server.url("p"), {}, status);
+    EXPECT_THAT(lastRequest(), StartsWith("POST /p HTTP/1.1\r\n"));
+    EXPECT_THAT(lastRequest(),
+                HasSubstr("\r\nContent-Type: application/octet-stream\r\nContent-Length: 0\r\n"));
+    client.postJson(server.url("p"), {{QStringLiteral("k"), 2}}, status);
+    EXPECT_THAT(lastRequest(), HasSubstr("\r\nContent-Type: application/json\r\n"));
+    EXPECT_THAT(lastRequest(), EndsWith("\r\n\r\n{\n    \"k\": 2\n}\n"));
+}
+
+TEST_F(Client, RefusesAHeaderLineThatWouldBeTwo)
+{
+    EXPECT_THROW(client.postBytes(server.url("p"), "b", "a\r\nX-Admin: 1", status), std::runtime_error);
+    EXPECT_TRUE(server.requests().empty());
+}
+
+TEST_F(Client, DeletesCloudObjectsAndNothingElse)
+{
+    qputenv("KDD_CLOUD_API", server.url("").c_str());
+    client.setSessionID("12");
+    client.setAuthorization([] { return "Authorization: Bearer t"; });
+    EXPECT_TRUE(client.deleteObject(server.url("x")));
+    EXPECT_TRUE(server.requests().empty());
+    EXPECT_TRUE(client.deleteObject("gs://b/x/y"));
+    EXPECT_THAT(lastRequest(), StartsWith("DELETE /b/x%2Fy HTTP/1.1\r\nHost: 127.0.0.1:"));
+    EXPECT_THAT(lastRequest(), HasSubstr("\r\nAuthorization: Bearer t\r\nCache-Control: no-transform\r\n"));
+    qputenv("KDD_CLOUD_API", "http://127.0.0.1:1/");
+    EXPECT_THROW(client.deleteObject("gs://b/x"), CurlError);
+}
+
+class ManyThreads : public testing::TestWithParam<CurlShare::Connections>
+{
+};
+
+TEST_P(ManyThreads, GetEachItsOwnAnswer)
+{
+    const NginxServer nginx(NginxServer::Scheme::Http, "location / { return 200 $uri; }");
+    const CurlShare share(GetParam());
+    const auto factory = std::make_shared<KxCurlHandleFactory>(4);  // too few to keep all handles
+    std::vector<std::thread> threads;
+    for (int i = 0; i < 8; ++i)
+        threads.emplace_back([&, path = "/" + std::to_string(i)] {
+            for (int round = 0; round < 25; ++round) {
+                KxCurlRequest request(factory, share, nginx.url(path.substr(1)), "GET");
+                request.perform();
+                EXPECT_EQ(request.response().toStdString(), path);
+            }
+        });
+    for (std::thread& thread : threads)
+        thread.join();
+}
+
+INSTANTIATE_TEST_SUITE_P(Net, ManyThreads,
+                         testing::Values(CurlShare::Connections::Shared, CurlShare::Connections::PerHandle));
+
+}  // namespace

@@ -1,0 +1,82 @@
+#include "kddlib/net/RequestAddress.h"
+
+#include "kddlib/net/KxCurlClient.h"
+#include "kddlib/net/PreparedRequest.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+using namespace Kdd;
+using testing::ElementsAre;
+
+namespace
+{
+
+TEST(RequestAddress, IsToldFromAFileNameByItsFirstLetters)
+{
+    EXPECT_FALSE(KxCurlClient::isUrl(nullptr));
+    EXPECT_FALSE(KxCurlClient::isUrl("h"));
+    EXPECT_FALSE(KxCurlClient::isUrl("ftp://a"));
+    EXPECT_TRUE(KxCurlClient::isUrl("gsx"));
+    EXPECT_TRUE(KxCurlClient::isUrl("https://a"));
+}
+
+TEST(RequestAddress, OfTheWebServiceIsMadeOfHostAndPath)
+{
+    qputenv("KDD_WEB_HOST", "pacs:8443");
+    EXPECT_EQ(KxCurlClient::url("GetStudy?x=1"), "https://pacs:8443/quil/Browser.svc/GetStudy?x=1");
+    qunsetenv("KDD_WEB_HOST");
+}
+
+TEST(RequestAddress, OfTheCloudHasItsObjectEscaped)
+{
+    const std::pair<const char*, const char*> kCases[] = {
+        {"gs://scans/2020/study1.dcm", "scans/2020%2Fstudy1.dcm"},
+        {"gs:bucket", "bucket"},
+        {"gs:///b/x/y", "b/x%2Fy"},
+        {"gs:b/a//b ?", "b/a%2F/b ?"},
+        {"gs:b/x/", "b/x%2F"},
+        {"gs://", ""}};
+    qputenv("KDD_CLOUD_API", "http://cloud:90");
+    for (const auto& [address, path] : kCases)
+        EXPECT_EQ(cloudUrl(address, CloudEndpoint::Api), std::string("http://cloud:90/") + path);
+    EXPECT_EQ(cloudApiHost(), "cloud:90");
+    qunsetenv("KDD_CLOUD_API");
+}
+
+TEST(PreparedRequest, CarriesTheSessionEverywhereButToTheCloud)
+{
+    ClientSettings settings;
+    const auto urlOf = [&](const char* address) {
+        return prepareRequest(address, {}, RequestBody::None, settings).url;
+    };
+    EXPECT_EQ(urlOf("https://a/b"), "https://a/b");
+    settings.sessionId = "7&";
+    EXPECT_EQ(urlOf("https://a/b"), "https://a/b?s=7&");
+    EXPECT_EQ(urlOf("https://a/b?c"), "https://a/b?c&s=7&");
+    EXPECT_EQ(urlOf("gs://a/b"), "https://storage-download.googleapis.com/a/b");
+}
+
+TEST(PreparedRequest, CarriesTheHeadersOfTheCloudOnlyWithAuthorization)
+{
+    ClientSettings settings;
+    EXPECT_THAT(prepareRequest("gs:a/b", {"X: 1"}, RequestBody::None, settings).headers, ElementsAre("X: 1"));
+    settings.authorization = [] { return "Authorization: Bearer t"; };
+    const PreparedRequest post = prepareRequest("gs:a/b", {"X: 1"}, RequestBody::Sent, settings);
+    EXPECT_EQ(post.url, "https://storage-upload.googleapis.com/a/b");
+    EXPECT_THAT(post.headers, ElementsAre("X: 1", "Expect: ", "Authorization: Bearer t",
+                                          "Host: storage.googleapis.com", "Cache-Control: no-transform"));
+}
+
+TEST(PreparedRequest, FirstRangeHasAtLeast1025Bytes)
+{
+    ClientSettings settings;
+    settings.chunkSizeForPartialRequests = 100;
+    EXPECT_EQ(lastByteOfFirstRange(settings), -1);
+    settings.numConcurrentRequestsPerFile = 2;
+    EXPECT_EQ(lastByteOfFirstRange(settings), 1024);
+    settings.chunkSizeForPartialRequests = 2000;
+    EXPECT_EQ(lastByteOfFirstRange(settings), 1999);
+}
+
+}  // namespace
