@@ -9,6 +9,7 @@
 #include "platform/volumefile/OrlanMeshWriter.h"
 #include "platform/volumefile/SOPInstanceUtility.h"
 #include "support/DatasetBuilder.h"
+#include "support/HttpServer.h"
 #include "support/LogCapture.h"
 #include "support/TemporaryStore.h"
 
@@ -86,6 +87,15 @@ protected:
     void addVolume(const QByteArray& name, const std::vector<std::string>& sopUIDs,
                    const QMap<QByteArray, QByteArray>& attributes = {})
     {
+        writeVolume(name, sopUIDs, attributes);
+        registerVolume(path(name));
+    }
+
+    void registerVolume(const QByteArray& place) { registerFiles({{}, {{place, {}, "1.2", "1.2.3"}}, {}}); }
+
+    void writeVolume(const QByteArray& name, const std::vector<std::string>& sopUIDs,
+                     const QMap<QByteArray, QByteArray>& attributes = {})
+    {
         Result result;
         const int slices = qMax(1, static_cast<int>(sopUIDs.size()));
         const Lattice lattice{"Level0", {kSize, kSize, slices}, PrimitiveType::UInt8, 1};
@@ -107,7 +117,6 @@ protected:
         parameters.insert("PaddingRangeMax", Parameter::ofIntegers({2}));
         ASSERT_TRUE(writer->writeParameters(parameters).good());
         ASSERT_TRUE(writer->finish().good());
-        registerFiles({{}, {{path(name), {}, "1.2", "1.2.3"}}, {}});
     }
 
     void registerFiles(const Kxg::FileRecords& files)
@@ -195,6 +204,23 @@ TEST_F(GeneratorTest, AVolumeOfFramesNamesEachImageOnce)
     EXPECT_EQ(volumes.first()->sopUIDList(), (std::vector<std::string>{"8.0", "8.1", "9.0"}));
     EXPECT_EQ(volumes.first()->paddingValue().value_or(0), 1);
     EXPECT_EQ(volumes.first()->paddingRangeLimit().value_or(0), 2);
+}
+
+TEST_F(GeneratorTest, VolumesAreFetchedFromTheirUrls)
+{
+    addFile(anImage("8"), "8");
+    writeVolume("a.vol", {"8"});
+    QFile volume(QString::fromLocal8Bit(path("a.vol")));
+    ASSERT_TRUE(volume.open(QIODevice::ReadOnly));
+    const NginxServer server;
+    server.addFile("a.vol", volume.readAll());
+    registerVolume(QByteArray::fromStdString(server.url("/a.vol")));
+    registerVolume(QByteArray::fromStdString(server.url("/gone.vol")));
+    const LogCapture log;
+    TagFile file;
+    ASSERT_TRUE(build(file));
+    EXPECT_EQ(file.seriesByUID().first()->volumes().size(), 1);
+    EXPECT_EQ(log.count("Reading " + server.url("/gone.vol") + " failed: HTTP response code 404"), 1);
 }
 
 TEST_F(GeneratorTest, OnlyMammogramsAreNavigated)

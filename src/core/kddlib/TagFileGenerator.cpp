@@ -2,6 +2,8 @@
 
 #include "kddlib/Limits.h"
 #include "kddlib/net/DicomFileReader.h"
+#include "kddlib/net/KxCurlClient.h"
+#include "kddlib/net/KxHttpStatus.h"
 #include "kddlib/previews/PreviewGenerator.h"
 #include "kddlib/previews/QuadrantNavigation.h"
 #include "kddlib/tagfile/TagFile.h"
@@ -17,6 +19,7 @@
 
 #include <dcmtk/dcmdata/dcfilefo.h>
 
+#include <exception>
 #include <map>
 
 namespace Kdd
@@ -34,6 +37,36 @@ const char* const kMammography = "MG";
 const char* userOrDefault(const char* user)
 {
     return user != nullptr ? user : kDefaultUser;
+}
+
+/// False, with the reason logged, when the bytes cannot be had.
+bool download(const char* url, QByteArray& bytes)
+{
+    KxHttpStatus status;
+    try {
+        bytes = KxCurlClient::instance().readBytes(url, status);
+    } catch (const std::exception& fault) {
+        LogFile::errorf("Reading %s failed: %s", url, fault.what());
+        return false;
+    }
+    if (!status.ok())
+        LogFile::errorf("Reading %s failed: HTTP response code %d", url, status.code);
+    return status.ok();
+}
+
+/// Null, with the reason logged, when there is no usable volume file.
+std::unique_ptr<OrlanMesh> openVolume(const char* path)
+{
+    Result result;
+    std::unique_ptr<OrlanMesh> mesh;
+    QByteArray bytes;
+    if (!KxCurlClient::isUrl(path))
+        mesh = OrlanMesh::read(QByteArray(path), result);
+    else if (download(path, bytes))
+        mesh = OrlanMesh::read(bytes, path, result);
+    if (result.bad())
+        LogFile::errorf("%s", qUtf8Printable(result.text()));
+    return mesh;
 }
 
 }  // namespace
@@ -210,12 +243,9 @@ void TagFileGenerator::addVolumeInfo(TagFile& tagFile, const std::vector<std::st
 VolumeInfo* TagFileGenerator::createVolumeInfo(const char* path, QByteArray& seriesInstanceUID)
 {
     const StopwatchSum::Running running(mVolumeWatch);
-    Result result;
-    const std::unique_ptr<OrlanMesh> mesh = OrlanMesh::read(QByteArray(path), result);
-    if (mesh == nullptr) {
-        LogFile::errorf("%s", qUtf8Printable(result.text()));
+    const std::unique_ptr<OrlanMesh> mesh = openVolume(path);
+    if (mesh == nullptr)
         return nullptr;
-    }
     auto info = std::make_unique<VolumeInfo>();
     seriesInstanceUID = dicomValue(*mesh, kSeriesInstanceUID);
     if (!info->readHeader(*mesh, path))
