@@ -27,6 +27,7 @@ struct SeriesInfo;
 namespace Kdd
 {
 
+class Item;
 class TagMap;
 struct VolumeInfo;
 enum class Flush;
@@ -98,6 +99,10 @@ public:
 
     /// Null also when the image has another file name suffix; an empty suffix matches any.
     TagMap* findImage(const QByteArray& sopUID, const QByteArray& suffix) const;
+
+    /// The same image as an `ItemTM` that keeps its study alive, also after the tag file has let go of it; empty when
+    /// absent.
+    std::shared_ptr<Item> findImageEx(const QByteArray& sopUID, const QByteArray& suffix) const;
 
     /// Takes the image out and gives a copy of all it showed, which the caller owns; null when absent. The series
     /// stays, even without images.
