@@ -1,6 +1,7 @@
 #include "kddlib/items/kdditemtm.h"
 
 #include "kddlib/net/DicomFileReader.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/tagmodel/TagSequence.h"
 #include "platform/base/LogFile.h"
@@ -18,9 +19,6 @@ namespace Kdd
 
 namespace
 {
-
-const DcmTagKey kFilePath(0x0006, 0x7100);
-const DcmTagKey kTransferSyntax(0x0006, 0x7102);
 
 constexpr int kFirstEncapsulated = EXS_JPEGProcess1;
 constexpr int kLastSyntax = EXS_PrivateGE_LEI_WithBigEndianPixelData;
