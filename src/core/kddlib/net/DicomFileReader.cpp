@@ -4,6 +4,7 @@
 #include "kddlib/net/BufferedFileProducer.h"
 
 #include <dcmtk/dcmdata/dcfilefo.h>
+#include <dcmtk/dcmdata/dcistrmb.h>
 #include <dcmtk/dcmdata/dcistrmf.h>
 
 #include <cstdint>
@@ -64,31 +65,15 @@ private:
     std::vector<std::uintptr_t> mOpen;
 };
 
-/// A file stream that turns bad as soon as the parser nests too deep, which makes it unwind.
-class DepthLimitedFileStream : public DcmInputStream
+/// A file as the parser reads it.
+class FileStream : public DcmInputStream
 {
 public:
-    explicit DepthLimitedFileStream(const char* path)
+    explicit FileStream(const char* path)
         : DcmInputStream(&mProducer)
         , mProducer(path)
         , mPath(path)
     {
-    }
-
-    offile_off_t read(void* buffer, offile_off_t length) override
-    {
-        if (mTooDeep)
-            return 0;
-        const offile_off_t count = DcmInputStream::read(buffer, length);
-        mTooDeep = !mGauge.accept(buffer, count, __builtin_frame_address(0));
-        return count;
-    }
-
-    OFBool good() const override { return !mTooDeep && DcmInputStream::good(); }
-
-    OFCondition status() const override
-    {
-        return mTooDeep ? OFCondition(EC_NestedTooDeep) : DcmInputStream::status();
     }
 
     /// How DCMTK finds a long value again that it has left in the file. In deflated data no offset leads to it.
@@ -97,20 +82,43 @@ public:
         return currentProducer() == &mProducer ? new DcmInputFileStreamFactory(mPath, tell()) : nullptr;
     }
 
-    bool isTooDeep() const { return mTooDeep; }
-
 private:
     BufferedFileProducer mProducer;
     OFFilename mPath;
+};
+
+/// A stream that turns bad as soon as the parser nests too deep, which makes it unwind.
+template <typename Stream>
+class DepthLimited : public Stream
+{
+public:
+    using Stream::Stream;
+
+    offile_off_t read(void* buffer, offile_off_t length) override
+    {
+        if (mTooDeep)
+            return 0;
+        const offile_off_t count = Stream::read(buffer, length);
+        mTooDeep = !mGauge.accept(buffer, count, __builtin_frame_address(0));
+        return count;
+    }
+
+    OFBool good() const override { return !mTooDeep && Stream::good(); }
+
+    OFCondition status() const override
+    {
+        return mTooDeep ? OFCondition(EC_NestedTooDeep) : Stream::status();
+    }
+
+    bool isTooDeep() const { return mTooDeep; }
+
+private:
     NestingGauge mGauge;
     bool mTooDeep = false;
 };
 
-}  // namespace
-
-OFCondition readDicomFile(const char* path, DcmFileFormat& file)
+OFCondition readWhole(DcmInputStream& stream, DcmFileFormat& file)
 {
-    DepthLimitedFileStream stream(path);
     OFCondition condition = stream.status();
     if (condition.bad())
         return condition;
@@ -119,6 +127,24 @@ OFCondition readDicomFile(const char* path, DcmFileFormat& file)
     file.transferInit();
     condition = file.read(stream, EXS_Unknown, EGL_noChange, kMaxReadLength);
     file.transferEnd();
+    return condition;
+}
+
+}  // namespace
+
+OFCondition readDicomFile(const char* path, DcmFileFormat& file)
+{
+    DepthLimited<FileStream> stream(path);
+    const OFCondition condition = readWhole(stream, file);
+    return stream.isTooDeep() ? OFCondition(EC_NestedTooDeep) : condition;
+}
+
+OFCondition readDicomBuffer(const QByteArray& bytes, DcmFileFormat& file)
+{
+    DepthLimited<DcmInputBufferStream> stream;
+    stream.setBuffer(bytes.constData(), bytes.size());
+    stream.setEos();
+    const OFCondition condition = readWhole(stream, file);
     return stream.isTooDeep() ? OFCondition(EC_NestedTooDeep) : condition;
 }
 

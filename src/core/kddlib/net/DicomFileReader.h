@@ -2,6 +2,8 @@
 
 #include "platform/base/Export.h"
 
+#include <QByteArray>
+
 #include <dcmtk/config/osconfig.h>
 
 #include <dcmtk/ofstd/ofcond.h>
@@ -17,5 +19,9 @@ namespace Kdd
 /// As DCMTK's own loading, but an input whose sequences nest deeper than `kMaxItemDepth` items is refused while it is
 /// read ("Sequence items are nested too deep"): DCMTK recurses once for each level and would end the process.
 KDD_EXPORT OFCondition readDicomFile(const char* path, DcmFileFormat& file);
+
+/// The same from the bytes of a file, or from its beginning if that ends between two attributes. The bytes need not
+/// outlive the call.
+KDD_EXPORT OFCondition readDicomBuffer(const QByteArray& bytes, DcmFileFormat& file);
 
 }  // namespace Kdd

@@ -3,6 +3,7 @@
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/Volume.h"
+#include "kddlib/volumes/VolumeFileName.h"
 #include "platform/base/LogFile.h"
 #include "platform/database/DirectoryEntry.h"
 
@@ -20,24 +21,14 @@ namespace Kdd
 namespace
 {
 
-const char* const kPart = "_part";
-
 /// Which volume of its series the file of that name is. -1 for names of first parts: the first volume's file has no
 /// part in its name.
 int volumeIndexOf(const QByteArray& name)
 {
-    const int part = name.indexOf(kPart);
+    const int part = partNumberOf(name);
     if (part < 0)
         return 0;
-    constexpr int kTooMany = 100 * 1000 * 1000;
-    int number = 0;
-    for (int i = part + static_cast<int>(qstrlen(kPart)); i < name.size() && number < kTooMany; ++i) {
-        const char digit = name.at(i);
-        if (digit < '0' || digit > '9')
-            break;
-        number = number * 10 + (digit - '0');
-    }
-    return number >= 2 ? number - 1 : -1;
+    return part >= 2 ? part - 1 : -1;
 }
 
 /// Reports and documents that no viewer lists among the images.

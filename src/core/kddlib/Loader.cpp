@@ -1,0 +1,171 @@
+#include "kddlib/Loader.h"
+
+#include "kddlib/items/FileNaming.h"
+#include "kddlib/items/kdditemof.h"
+#include "kddlib/items/kdditemtm.h"
+#include "kddlib/net/DicomFileReader.h"
+#include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
+#include "kddlib/tagmodel/TagMap.h"
+#include "kddlib/volumes/Volume.h"
+#include "kddlib/volumes/VolumeFileName.h"
+#include "platform/base/LogFile.h"
+#include "platform/base/Stopwatch.h"
+#include "platform/os/RandomAccessFile.h"
+
+#include <dcmtk/dcmdata/dcfilefo.h>
+
+#include <new>
+
+namespace Kdd
+{
+
+namespace
+{
+
+std::shared_ptr<Item> itemOf(DcmFileFormat& file)
+{
+    return std::make_shared<ItemOF>(std::shared_ptr<DcmDataset>(file.getAndRemoveDataset()));
+}
+
+std::shared_ptr<Item> loadWholeFile(const char* path)
+{
+    DcmFileFormat file;
+    const OFCondition condition = readDicomFile(path, file);
+    if (condition.good())
+        return itemOf(file);
+    LogFile::errorf("Could not load %s: %s", path, condition.text());
+    return nullptr;
+}
+
+/// The first bytes of a file; false, with the reason logged, when there are not so many.
+bool readBeginning(const char* path, int size, QByteArray& bytes)
+{
+    RandomAccessFile file;
+    try {
+        bytes.resize(size);
+    } catch (const std::bad_alloc&) {
+        LogFile::errorf("%s: Could not allocate %lld bytes.", path, static_cast<long long>(size));
+        return false;
+    }
+    if (file.open(path) != 0) {
+        LogFile::errorf("Could not open %s", path);
+        return false;
+    }
+    const qint64 count = file.readAt(0, bytes.data(), size);
+    if (count != size)
+        LogFile::errorf("%s: Could only read %d of %d bytes", path, static_cast<int>(qMax<qint64>(0, count)),
+                        size);
+    return count == size;
+}
+
+std::shared_ptr<Item> loadBeginning(const char* path, int size)
+{
+    QByteArray bytes;
+    if (!readBeginning(path, qMax(0, size), bytes))
+        return nullptr;
+    DcmFileFormat file;
+    const OFCondition condition = readDicomBuffer(bytes, file);
+    if (condition.good())
+        return itemOf(file);
+    LogFile::errorf("Could not load %s from buffer stream: %s", path, condition.text());
+    return nullptr;
+}
+
+QByteArray baseName(const QByteArray& path)
+{
+    return path.mid(qMax(path.lastIndexOf('/'), path.lastIndexOf('\\')) + 1);
+}
+
+}  // namespace
+
+Loader::Loader() = default;
+Loader::Loader(const Loader& other) = default;
+Loader& Loader::operator=(const Loader& other) = default;
+Loader::~Loader() = default;
+
+void Loader::addTagFile(const QByteArray& studyUID, const std::shared_ptr<TagFile>& file)
+{
+    mTagFiles.insert(studyUID, file);
+}
+
+void Loader::clear()
+{
+    mTagFiles.clear();
+}
+
+/// A study without tag file gets an empty one, so that the file is not looked for at every request.
+TagFile& Loader::tagFileForStudy(const QByteArray& studyUID)
+{
+    std::shared_ptr<TagFile>& file = mTagFiles[studyUID];
+    if (file != nullptr)
+        return *file;
+    file = std::make_shared<TagFile>();
+    const Stopwatch stopwatch;
+    const QString path = TagFile::cacheFilePathForStudy(studyUID.constData());
+    if (file->readCacheFileForStudy(studyUID.constData(), false))
+        LogFile::printf("Tag file %s read in %d msec", qUtf8Printable(path), stopwatch.elapsed());
+    else
+        LogFile::warnf("No tag file found for study %s", studyUID.constData());
+    return *file;
+}
+
+std::shared_ptr<Item> Loader::loadMetaData(const char* path)
+{
+    QByteArray sopUID;
+    QByteArray studyUID;
+    return extractUIDs(path, sopUID, studyUID) ? loadMetaData(path, sopUID, studyUID)
+                                               : loadDcmDataset(path, -1);
+}
+
+std::shared_ptr<Item> Loader::loadMetaData(const char* path, const QByteArray& sopUID,
+                                           const QByteArray& studyUID)
+{
+    std::shared_ptr<Item> item =
+        studyUID.isEmpty() ? nullptr : tagFileForStudy(studyUID).findImageEx(sopUID, extractSuffix(path));
+    if (item == nullptr)
+        return loadDcmDataset(path, -1);
+    // Under this path the file is known to whoever asks, wherever it lay when the tag file was built.
+    static_cast<ItemTM&>(*item).tagMap().putAndInsertValue(kFilePath, VrCode::LO, path);
+    return item;
+}
+
+std::shared_ptr<Item> Loader::loadDcmDataset(const char* path, int size)
+{
+    return size == -1 ? loadWholeFile(path) : loadBeginning(path, size);
+}
+
+Volume* Loader::loadVolume(const char* path, const QByteArray& seriesUID, const QByteArray& studyUID)
+{
+    const TagMap* series = studyUID.isEmpty() ? nullptr : tagFileForStudy(studyUID).findSeries(seriesUID);
+    if (series == nullptr)
+        return nullptr;
+    const QByteArray name = baseName(path);
+    const int part = partNumberOf(name);
+    const int index = part < 0 ? 0 : part - 1;
+    if (index < 0 || index >= series->volumes().size()) {
+        LogFile::warnf("Illegal volume index. Cannot load volume from tag file.");
+        return nullptr;
+    }
+    Volume* volume = series->volumes().at(index);
+    if (volume->fileNameSuffix().isEmpty()) {
+        LogFile::printf("No filename suffix. Cannot load volume from tag file.");
+        return nullptr;
+    }
+    if (Volume::fileNameSuffix(name.constData()) == volume->fileNameSuffix())
+        return volume;
+    LogFile::warnf("Filename suffix does not match. Cannot load volume from tag file.");
+    return nullptr;
+}
+
+bool Loader::extractUIDs(const char* path, QByteArray& sopUID, QByteArray& studyUID)
+{
+    return Kdd::extractUIDs(path, sopUID, studyUID);
+}
+
+QByteArray Loader::extractSuffix(const char* path)
+{
+    return Kdd::extractSuffix(path);
+}
+
+}  // namespace Kdd

@@ -1,0 +1,31 @@
+#include "kddlib/volumes/VolumeFileName.h"
+
+namespace Kdd
+{
+
+namespace
+{
+
+const char* const kPart = "_part";
+
+/// Beyond every number of volumes, and far from what an int cannot hold.
+constexpr int kTooMany = 100 * 1000 * 1000;
+
+}  // namespace
+
+int partNumberOf(const QByteArray& name)
+{
+    const int part = name.indexOf(kPart);
+    if (part < 0)
+        return -1;
+    int number = 0;
+    for (int i = part + static_cast<int>(qstrlen(kPart)); i < name.size() && number < kTooMany; ++i) {
+        const char digit = name.at(i);
+        if (digit < '0' || digit > '9')
+            break;
+        number = number * 10 + (digit - '0');
+    }
+    return number;
+}
+
+}  // namespace Kdd

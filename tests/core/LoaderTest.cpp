@@ -1,0 +1,164 @@
+#include "kddlib/Loader.h"
+
+#include "kddlib/items/kdditem.h"
+#include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagmodel/TagElement.h"
+#include "kddlib/tagmodel/TagMap.h"
+#include "kddlib/volumes/Volume.h"
+#include "support/DatasetBuilder.h"
+#include "support/LogCapture.h"
+#include "support/TemporaryStore.h"
+
+#include <QDir>
+#include <QFile>
+
+#include <gtest/gtest.h>
+
+namespace Kdd
+{
+namespace
+{
+
+/// A study "1.2" whose images lie where a server keeps them, in a folder of its own.
+class LoaderTest : public testing::Test
+{
+protected:
+    LoaderTest() { QDir().mkpath(mStore.filePath("1.2")); }
+
+    QByteArray path(const char* name) const { return mStore.filePath("1.2").toLocal8Bit() + '/' + name; }
+
+    /// The image's file, as `path` names it, and the image in the tag file with another patient's name.
+    void add(const char* sopUID, const char* name)
+    {
+        save(anImage(sopUID).with(DCM_PatientName, "of^file"), name);
+        file->addTagMap(anImage(sopUID).with(DCM_PatientName, "of^cache").map(), path(name).constData(),
+                        true);
+    }
+
+    void save(const DatasetBuilder& image, const char* name) const
+    {
+        DcmFileFormat format(&image.dataset());
+        ASSERT_TRUE(format.saveFile(path(name).constData(), EXS_LittleEndianExplicit).good());
+    }
+
+    static std::string nameIn(const std::shared_ptr<Item>& item)
+    {
+        OFString name;
+        return item != nullptr && item->findAndGetOFString(DCM_PatientName, name).good() ? name.c_str()
+                                                                                         : "nothing";
+    }
+
+    TemporaryStore mStore;
+    std::shared_ptr<TagFile> file = std::make_shared<TagFile>();
+    Loader loader;
+};
+
+TEST_F(LoaderTest, TheTagFileAnswersAndTheFileIsReadForAllElse)
+{
+    add("1", "1_0.dcm");
+    ASSERT_TRUE(file->writeCacheFile());
+    save(anImage("2").with(DCM_PatientName, "of^file"), "2_0.dcm");
+    const std::shared_ptr<Item> cached = loader.loadMetaData(path("1_0.dcm").constData());
+    EXPECT_EQ(nameIn(cached), "of^cache");
+    EXPECT_EQ(nameIn(loader.loadMetaData(path("1_7.dcm").constData())), "nothing")
+        << "another file of the image";
+    EXPECT_EQ(nameIn(loader.loadMetaData(path("2_0.dcm").constData())), "of^file");
+    loader.clear();
+    ASSERT_NE(cached->obtainDcmDataset(), nullptr) << "the item outlives what the loader kept";
+    OFString name;
+    cached->obtainDcmDataset()->findAndGetOFString(DCM_PatientName, name);
+    EXPECT_EQ(name, "of^file");
+}
+
+TEST_F(LoaderTest, AMissingTagFileIsLookedForOnce)
+{
+    save(anImage("1"), "1_0.dcm");
+    const LogCapture log;
+    for (int i = 0; i < 3; ++i)
+        EXPECT_NE(loader.loadMetaData(path("1_0.dcm").constData()), nullptr);
+    EXPECT_EQ(log.count("No tag file found for study 1.2"), 1);
+    loader.clear();
+    loader.loadMetaData(path("1_0.dcm").constData());
+    EXPECT_EQ(log.count("No tag file found for study 1.2"), 2);
+}
+
+TEST_F(LoaderTest, OfPathsThatNameNoImageTheFileIsRead)
+{
+    save(anImage("1").with(DCM_PatientName, "of^file"), "1_0.DCM");
+    const LogCapture log;
+    EXPECT_EQ(nameIn(loader.loadMetaData(path("1_0.DCM").constData())), "of^file");
+    EXPECT_TRUE(log.lines().empty());
+    EXPECT_EQ(loader.loadMetaData(path("gone.DCM").constData()), nullptr);
+    EXPECT_EQ(log.count("Could not load " + path("gone.DCM").toStdString()), 1);
+}
+
+TEST_F(LoaderTest, TheBeginningOfAFileIsRead)
+{
+    save(anImage("1").with(DCM_PatientName, "of^file").withLong(DCM_TextValue, 2000), "1");
+    QFile whole(QString::fromLocal8Bit(path("1")));
+    ASSERT_TRUE(whole.open(QIODevice::ReadOnly));
+    const int size = static_cast<int>(whole.size());
+    const LogCapture log;
+    EXPECT_EQ(nameIn(loader.loadDcmDataset(path("1").constData(), size)), "of^file");
+    EXPECT_EQ(loader.loadDcmDataset(path("1").constData(), size + 1), nullptr);
+    EXPECT_EQ(log.count(path("1").toStdString() + ": Could only read " + std::to_string(size) + " of " +
+                        std::to_string(size + 1) + " bytes"),
+              1);
+    EXPECT_EQ(loader.loadDcmDataset(path("gone").constData(), 10), nullptr);
+    EXPECT_EQ(log.count("Could not open " + path("gone").toStdString()), 1);
+    for (int cut = 0; cut < size; cut += 97)
+        loader.loadDcmDataset(path("1").constData(), cut);
+}
+
+TEST_F(LoaderTest, ABeginningThatNestsTooDeepIsRefused)
+{
+    DatasetBuilder image = anImage("1");
+    DatasetBuilder item = anItem();
+    for (int depth = 0; depth < 300; ++depth)
+        item = anItem().withItem(DCM_ContentSequence, item);
+    save(image.withItem(DCM_ContentSequence, item), "deep");
+    const int size = static_cast<int>(QFile(QString::fromLocal8Bit(path("deep"))).size());
+    const LogCapture log;
+    EXPECT_EQ(loader.loadDcmDataset(path("deep").constData(), size), nullptr);
+    EXPECT_EQ(log.count("nested too deep"), 1);
+}
+
+struct VolumeRequest
+{
+    const char* name;
+    int index;  // -1: none
+    const char* message;
+};
+
+class LoaderVolumes : public LoaderTest, public testing::WithParamInterface<VolumeRequest>
+{
+};
+
+TEST_P(LoaderVolumes, AreFoundByTheNamesOfTheirFiles)
+{
+    add("1", "1_0.dcm");
+    TagMap* series = file->findSeries("1.2.3");
+    for (const char* suffix : {"volume", "volume_2", ""}) {
+        series->addBareVolume(new Volume(series->volumes().size()));
+        series->volumes().last()->setFileNameSuffix(suffix);
+    }
+    loader.addTagFile("1.2", file);
+    const LogCapture log;
+    Volume* const found = loader.loadVolume(GetParam().name, "1.2.3", "1.2");
+    EXPECT_EQ(found, GetParam().index < 0 ? nullptr : series->volumes().at(GetParam().index));
+    EXPECT_EQ(log.count(GetParam().message), GetParam().index < 0 ? 1 : 0);
+    EXPECT_EQ(loader.loadVolume(GetParam().name, "9", "1.2"), nullptr);
+    EXPECT_EQ(loader.loadVolume(GetParam().name, "1.2.3", ""), nullptr);
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Names, LoaderVolumes,
+    testing::Values(
+        VolumeRequest{"/a_part7/1.2.3-volume.vol", 0, "-"}, VolumeRequest{"1.2.3-volume_part002.vol", 1, "-"},
+        VolumeRequest{"vol_part0.dcm", -1, "Illegal volume index. Cannot load volume from tag file."},
+        VolumeRequest{"1-volume_part004.vol", -1, "Illegal volume index."},
+        VolumeRequest{"1-volume_part003.vol", -1, "No filename suffix. Cannot load volume from tag file."},
+        VolumeRequest{"1-other.vol", -1, "Filename suffix does not match."}));
+
+}  // namespace
+}  // namespace Kdd
