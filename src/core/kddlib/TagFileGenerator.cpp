@@ -15,6 +15,7 @@
 #include "platform/database/Kxg.h"
 #include "platform/volumefile/OrlanMesh.h"
 
+#include <QHash>
 #include <QMap>
 
 #include <dcmtk/dcmdata/dcfilefo.h>
@@ -98,6 +99,30 @@ private:
     std::map<QByteArray, std::unique_ptr<DcmDataset>> mDatasets;
 };
 
+/// Images that were loaded before the building began, by their paths.
+class TagFileGenerator::LoadedImages
+{
+public:
+    explicit LoadedImages(const TagFile& file)
+    {
+        for (const TagMap* image : file.imagesByUID())
+            mImages.insert(filePathOf(*image), image);
+    }
+
+    /// The image as it comes from the file; null when the file at the path is not among them.
+    std::unique_ptr<TagMap> copy(const std::string& path) const
+    {
+        const TagMap* image = mImages.value(QByteArray::fromStdString(path), nullptr);
+        std::unique_ptr<TagMap> copy(image != nullptr ? image->clone() : nullptr);
+        if (copy != nullptr)
+            copy->deleteElement(kFilePath);
+        return copy;
+    }
+
+private:
+    QHash<QByteArray, const TagMap*> mImages;
+};
+
 TagFileGenerator::TagFileGenerator()
     : TagFileGenerator(nullptr, true)
 {
@@ -130,6 +155,12 @@ bool TagFileGenerator::createTagFile(int studyId)
 
 bool TagFileGenerator::createTagFile(TagFile& tagFile, int studyId, const char* studyInstanceUID)
 {
+    return createTagFile(tagFile, studyId, studyInstanceUID, TagFile());
+}
+
+bool TagFileGenerator::createTagFile(TagFile& tagFile, int studyId, const char* studyInstanceUID,
+                                     const TagFile& loaded)
+{
     mLoadWatch = mVolumeWatch = mPreviewWatch = {};
     tagFile.clear();
     std::vector<std::string> dicomFiles;
@@ -143,8 +174,13 @@ bool TagFileGenerator::createTagFile(TagFile& tagFile, int studyId, const char* 
         return false;
     }
     KeptDatasets datasets;
-    for (const std::string& path : dicomFiles)
-        addDicomFile(tagFile, path, studyInstanceUID, datasets);
+    const LoadedImages images(loaded);
+    for (const std::string& path : dicomFiles) {
+        if (std::unique_ptr<TagMap> image = images.copy(path))
+            addImage(tagFile, std::move(image), path, studyInstanceUID);
+        else
+            addDicomFile(tagFile, path, studyInstanceUID, datasets);
+    }
     addVolumeInfo(tagFile, volumeFiles);
     QList<QByteArray> chosen;
     tagFile.selectPreviewImages2D(chosen);
@@ -191,21 +227,30 @@ void TagFileGenerator::addDicomFile(TagFile& tagFile, const std::string& path, c
         return;
     }
     std::unique_ptr<TagMap> map(TagMap::createTagMap(file.getDataset(), kDefaultValueBound));
-    const bool isForeign =
-        studyInstanceUID != nullptr && tagFile.isEmpty() && map->uid(TagMap::StudyLevel) != studyInstanceUID;
+    const QByteArray sopUID = map->uid(TagMap::ImageLevel);
+    if (addImage(tagFile, std::move(map), path, studyInstanceUID))
+        datasets.keep(sopUID, std::unique_ptr<DcmDataset>(file.getAndRemoveDataset()));
+}
+
+/// False, with the reason logged, when the image belongs to another study.
+bool TagFileGenerator::addImage(TagFile& tagFile, std::unique_ptr<TagMap> image, const std::string& path,
+                                const char* studyInstanceUID)
+{
+    const bool isForeign = studyInstanceUID != nullptr && tagFile.isEmpty() &&
+                           image->uid(TagMap::StudyLevel) != studyInstanceUID;
     const int before = tagFile.imagesByUID().size();
-    TagMap* image = isForeign ? nullptr : tagFile.addTagMap(map.release(), path.c_str(), true);
-    if (image == nullptr) {
+    TagMap* placed = isForeign ? nullptr : tagFile.addTagMap(image.release(), path.c_str(), true);
+    if (placed == nullptr) {
         LogFile::warnf("File %s does not belong to study %s", path.c_str(),
                        studyInstanceUID != nullptr ? studyInstanceUID
                                                    : tagFile.studyInstanceUID().constData());
-        return;
+        return false;
     }
     if (tagFile.imagesByUID().size() == before)
         LogFile::warnf("%s replaces another file of the same SOP Instance UID", path.c_str());
     // Who reads the tag file finds the image without asking the database; a sync keeps the path up to date.
-    image->putAndInsertValue(kFilePath, VrCode::LO, QByteArray::fromStdString(path));
-    datasets.keep(image->uid(TagMap::ImageLevel), std::unique_ptr<DcmDataset>(file.getAndRemoveDataset()));
+    placed->putAndInsertValue(kFilePath, VrCode::LO, QByteArray::fromStdString(path));
+    return true;
 }
 
 /// Of the images chosen those that are held.

@@ -15,6 +15,7 @@ namespace Kdd
 
 class OrlanMesh;
 class TagFile;
+class TagMap;
 struct VolumeInfo;
 
 /// Builds the complete tag file of a study: images, volumes and previews, from the files that the image database lists
@@ -42,6 +43,9 @@ public:
     /// built.
     bool createTagFile(TagFile& tagFile, int studyId, const char* studyInstanceUID);
 
+    /// The same, but files whose images `loaded` holds, by their paths in (0006,7100), are not loaded again.
+    bool createTagFile(TagFile& tagFile, int studyId, const char* studyInstanceUID, const TagFile& loaded);
+
     /// The same on a tag file of its own.
     bool createTagFile(int studyId);
 
@@ -62,9 +66,12 @@ protected:
 
 private:
     class KeptDatasets;
+    class LoadedImages;
 
     void addDicomFile(TagFile& tagFile, const std::string& path, const char* studyInstanceUID,
                       KeptDatasets& datasets);
+    static bool addImage(TagFile& tagFile, std::unique_ptr<TagMap> image, const std::string& path,
+                         const char* studyInstanceUID);
     void addPreviews(TagFile& tagFile, const QList<QByteArray>& chosen, const KeptDatasets& datasets);
     void addPreview(OrlanMesh& mesh, const char* path, VolumeInfo& info);
     void finishTree(TagFile& tagFile) const;

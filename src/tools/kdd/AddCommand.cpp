@@ -88,7 +88,7 @@ private:
 
     bool place(DicomInput& input);
     bool write(Pending::iterator study);
-    bool writeClaimed(Kxg::StudyClaim& claim, TagFile& file);
+    bool writeClaimed(Kxg::StudyClaim& claim, TagFile& arrivals);
     static bool merge(TagFile& file);
     bool writeLongestUntouched();
     void count(const QByteArray& studyUID, const TagFile& file);
@@ -148,9 +148,7 @@ bool Adder::write(Pending::iterator study)
     TagFile& file = study->second.file;
     const int images = study->second.images;
     const std::unique_ptr<Kxg::StudyClaim> claim = claimStudy(mDatabase, studyUID);
-    if (claim != nullptr && writeClaimed(*claim, file)) {
-        count(studyUID, file);
-    } else {
+    if (claim == nullptr || !writeClaimed(*claim, file)) {
         LogFile::errorf("%d images of study %s are not added", images, studyUID.constData());
         mFailed += qMax(1, images);
         mTotals.remove(studyUID);
@@ -162,16 +160,23 @@ bool Adder::write(Pending::iterator study)
 
 /// Volumes are made of images that may be anywhere in the study, so a study with volume files is built as a whole; to
 /// any other what arrived is added.
-bool Adder::writeClaimed(Kxg::StudyClaim& claim, TagFile& file)
+bool Adder::writeClaimed(Kxg::StudyClaim& claim, TagFile& arrivals)
 {
+    const QByteArray& studyUID = claim.studyInstanceUID();
     QVector<QByteArray> volumes;
-    if (!succeeded(mDatabase.volumeFiles(claim.studyInstanceUID(), volumes)))
+    if (!succeeded(mDatabase.volumeFiles(studyUID, volumes)))
         return false;
-    if (!volumes.isEmpty())
-        return buildStudy(claim, true, file);
-    TagFileGenerator().completeArrivals(file);
-    return merge(file) &&
-           succeeded(mDatabase.finishRequests(mRegistration.requests().take(claim.studyInstanceUID())));
+    if (!volumes.isEmpty()) {
+        TagFile whole;
+        const bool isBuilt = buildStudy(claim, true, whole, arrivals);
+        count(studyUID, whole);
+        return isBuilt;
+    }
+    TagFileGenerator().completeArrivals(arrivals);
+    const bool isMerged =
+        merge(arrivals) && succeeded(mDatabase.finishRequests(mRegistration.requests().take(studyUID)));
+    count(studyUID, arrivals);
+    return isMerged;
 }
 
 bool Adder::merge(TagFile& file)

@@ -18,9 +18,14 @@ constexpr int kPatience = 10 * 60 * 1000;
 
 bool buildStudy(Kxg::StudyClaim& claim, bool optimize, TagFile& file)
 {
+    return buildStudy(claim, optimize, file, TagFile());
+}
+
+bool buildStudy(Kxg::StudyClaim& claim, bool optimize, TagFile& file, const TagFile& loaded)
+{
     const QByteArray& studyUID = claim.studyInstanceUID();
     TagFileGenerator generator(nullptr, optimize);
-    if (!generator.createTagFile(file, claim.studyId(), studyUID.constData())) {
+    if (!generator.createTagFile(file, claim.studyId(), studyUID.constData(), loaded)) {
         LogFile::errorf("The tag file of study %s is not built: %s", studyUID.constData(),
                         file.isEmpty() ? "none of its files could be read" : qUtf8Printable(file.failure()));
         return false;
