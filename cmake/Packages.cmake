@@ -1,7 +1,7 @@
 # What the library stands on; the Debian packages are listed in packages.txt.
 find_package(DCMTK CONFIG REQUIRED)
 find_package(Qt5 REQUIRED COMPONENTS Core Gui Sql)
-find_package(HDF5 REQUIRED COMPONENTS C HL)
+find_package(HDF5 REQUIRED COMPONENTS C)
 find_package(CURL REQUIRED)
 find_package(OpenSSL REQUIRED)
 find_package(LibLZMA REQUIRED)

@@ -131,6 +131,8 @@ TEST_F(Archive, SeriesBecomeVolumesAndStudiesPictures)
     EXPECT_GT(stacked.number("volumes"), 0);
     EXPECT_EQ(kdd("stack --json").number("volumes"), 0) << "they have volumes already";
     EXPECT_EQ(kdd("stack --json --again").number("volumes"), stacked.number("volumes"));
+    EXPECT_EQ(waiting(), 0) << "what stacking left in the queue is done";
+    EXPECT_EQ(stacked.out.count("\"hadVolumes\":true"), 2) << "those of the sample stay alone";
     EXPECT_EQ(kdd("verify --all").exitCode, 0);
     const QString sheet = mFolder.filePath(QStringLiteral("sheet.png"));
     const QString pictures = mFolder.filePath(QStringLiteral("pictures"));

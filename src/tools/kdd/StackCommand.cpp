@@ -33,7 +33,7 @@ struct StackedSeries
     bool hadVolumes = false;
 };
 
-/// Makes the volume files of one study, which is claimed.
+/// Makes and registers the volume files of one study, which is claimed.
 class StudyStacker
 {
 public:
@@ -45,15 +45,17 @@ public:
     }
 
     /// False when anything failed, which is logged. Volumes that were made are registered nevertheless.
-    bool run(Kxg::StudyClaim& claim);
+    bool run(const QByteArray& studyUID);
+
+    /// Whether the tag file has to be built because of it.
+    bool isChanged() const { return mIsChanged; }
 
     const QList<StackedSeries>& series() const { return mSeries; }
 
 private:
     bool stackSeries(const QByteArray& seriesUID, const TagMap& series);
-    bool clearSeries(const QByteArray& seriesUID, bool& isStacked);
+    bool clearSeries(const QByteArray& seriesUID, const TagMap& series, bool& isStacked);
     bool writeVolume(const QByteArray& seriesUID, const Stack& stack, int index);
-    bool registerAndBuild(Kxg::StudyClaim& claim);
 
     QByteArray volumePath(const QByteArray& seriesUID, int index) const
     {
@@ -66,12 +68,13 @@ private:
     QByteArray mStudyUID;
     QVector<QByteArray> mKnown;  // volume files of the study
     Kxg::FileRecords mMade;
+    bool mIsChanged = false;
     QList<StackedSeries> mSeries;
 };
 
-bool StudyStacker::run(Kxg::StudyClaim& claim)
+bool StudyStacker::run(const QByteArray& studyUID)
 {
-    mStudyUID = claim.studyInstanceUID();
+    mStudyUID = studyUID;
     TagFile file;
     if (!readStudyFile(TagFile::cacheFilePathForStudy(mStudyUID.constData()), file) ||
         !succeeded(mDatabase.volumeFiles(mStudyUID, mKnown)))
@@ -79,14 +82,18 @@ bool StudyStacker::run(Kxg::StudyClaim& claim)
     bool isDone = true;
     for (auto it = file.seriesByUID().cbegin(); it != file.seriesByUID().cend(); ++it)
         isDone = stackSeries(it.key(), *it.value()) && isDone;
-    return (mMade.volumes.empty() || registerAndBuild(claim)) && isDone;
+    if (mMade.volumes.empty())
+        return isDone;
+    mIsChanged = true;
+    QMap<QByteArray, qint64> requests;
+    return succeeded(mDatabase.registerFiles(mMade, requests)) && isDone;
 }
 
 bool StudyStacker::stackSeries(const QByteArray& seriesUID, const TagMap& series)
 {
     mSeries.append(StackedSeries{seriesUID, {}, {}, false});
     StackedSeries& told = mSeries.last();
-    if (!clearSeries(seriesUID, told.hadVolumes))
+    if (!clearSeries(seriesUID, series, told.hadVolumes))
         return false;
     if (told.hadVolumes)
         return true;
@@ -107,18 +114,19 @@ bool StudyStacker::stackSeries(const QByteArray& seriesUID, const TagMap& series
     return isDone;
 }
 
-/// A series that has volume files keeps them, unless they are to be made again; then they go first, for there may be
-/// fewer this time.
-bool StudyStacker::clearSeries(const QByteArray& seriesUID, bool& isStacked)
+/// A series that has volumes keeps them. Only those that were made here can be made again; then they go first, for
+/// there may be fewer this time.
+bool StudyStacker::clearSeries(const QByteArray& seriesUID, const TagMap& series, bool& isStacked)
 {
     QVector<QByteArray> ours;
     for (int i = 0; mKnown.contains(volumePath(seriesUID, i)); ++i)
         ours.append(volumePath(seriesUID, i));
-    isStacked = !ours.isEmpty() && !mAgain;
+    isStacked = ours.isEmpty() ? !series.volumes().isEmpty() : !mAgain;
     if (ours.isEmpty() || isStacked)
         return true;
     if (!succeeded(mDatabase.removeFiles(ours)))
         return false;
+    mIsChanged = true;
     for (const QByteArray& path : ours)
         QFile::remove(QString::fromLocal8Bit(path));
     return true;
@@ -138,12 +146,17 @@ bool StudyStacker::writeVolume(const QByteArray& seriesUID, const Stack& stack, 
     return true;
 }
 
-bool StudyStacker::registerAndBuild(Kxg::StudyClaim& claim)
+bool stackStudy(Kxg::Catalogue& database, const QByteArray& studyUID, StudyStacker& stacker)
 {
-    QMap<QByteArray, qint64> requests;
+    std::unique_ptr<Kxg::StudyClaim> claim = claimStudy(database, studyUID);
+    const bool isDone = claim != nullptr && stacker.run(studyUID);
+    if (!stacker.isChanged())
+        return isDone;
+    // Claimed anew, so that what stacking itself left in the queue is done with the building.
+    claim.reset();
+    claim = claimStudy(database, studyUID);
     TagFile file;
-    return succeeded(mDatabase.registerFiles(mMade, requests)) && buildStudy(claim, true, file) &&
-           succeeded(mDatabase.finishRequests(requests.values().toVector()));
+    return claim != nullptr && buildStudy(*claim, true, file) && isDone;
 }
 
 /// Below the folder of volumes as the tag files lie below theirs.
@@ -191,8 +204,7 @@ Outcome runStack(const GlobalOptions& options, const StackRequest& request)
     Progress progress("Stacking", !options.quiet);
     for (int i = 0; i < studyUIDs.size(); ++i) {
         StudyStacker stacker(*database, volumeFolder(options, studyUIDs.at(i)), request.again);
-        const std::unique_ptr<Kxg::StudyClaim> claim = claimStudy(*database, studyUIDs.at(i));
-        isDone = claim != nullptr && stacker.run(*claim) && isDone;
+        isDone = stackStudy(*database, studyUIDs.at(i), stacker) && isDone;
         for (const StackedSeries& series : stacker.series()) {
             volumes += series.volumes.size();
             told.append(jsonOf(series));
