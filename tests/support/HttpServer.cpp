@@ -74,12 +74,12 @@ QByteArray receiveRequest(int socket)
 }  // namespace
 
 NginxServer::NginxServer(Scheme scheme, const QByteArray& directives)
-    : mOrigin(scheme == Scheme::Https ? "https://localhost:" : "http://127.0.0.1:")
+    : mOrigin(scheme == Scheme::Http ? "http://127.0.0.1:" : "https://localhost:")
 {
     const size_t portStart = mOrigin.size();
     const int listener = listenLocally(mOrigin);
     QByteArray listen = QByteArray::fromStdString(mOrigin.substr(portStart)).chopped(1);
-    listen += scheme == Scheme::Https ? " ssl" : "";
+    listen += scheme == Scheme::Http ? "" : scheme == Scheme::Https ? " ssl" : " ssl http2";
     QDir(mFolder.path()).mkdir(QStringLiteral("files"));
     addFile("../nginx.conf", QByteArray(kConfiguration).replace("%1", listen).replace("%2", directives));
 

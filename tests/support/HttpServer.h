@@ -20,7 +20,7 @@ namespace Kdd
 class NginxServer
 {
 public:
-    enum class Scheme { Http, Https };
+    enum class Scheme { Http, Https, Http2 };
 
     /// `directives` go into the server's section.
     explicit NginxServer(Scheme scheme = Scheme::Http, const QByteArray& directives = {});

@@ -72,11 +72,11 @@ TEST(PreparedRequest, FirstRangeHasAtLeast1025Bytes)
 {
     ClientSettings settings;
     settings.chunkSizeForPartialRequests = 100;
-    EXPECT_EQ(lastByteOfFirstRange(settings), -1);
+    EXPECT_FALSE(firstRange(settings));
     settings.numConcurrentRequestsPerFile = 2;
-    EXPECT_EQ(lastByteOfFirstRange(settings), 1024);
+    EXPECT_EQ(firstRange(settings)->last, 1024);
     settings.chunkSizeForPartialRequests = 2000;
-    EXPECT_EQ(lastByteOfFirstRange(settings), 1999);
+    EXPECT_EQ(firstRange(settings, 5)->text(), "bytes=5-2004");
 }
 
 }  // namespace

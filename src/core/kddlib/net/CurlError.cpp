@@ -11,9 +11,15 @@ CurlError::CurlError(int code, const char* description)
     mMessage += curl_easy_strerror(static_cast<CURLcode>(code));
     if (description && *description)
         mMessage.append("\nError description: ").append(description);
+    mMessage += cureFor(code);
+}
+
+std::string CurlError::cureFor(int code)
+{
     // The default list has no cipher for servers that offer TLS 1.2 with ECDHE only, and their answer does not say so.
     if (code == CURLE_SSL_CONNECT_ERROR || code == CURLE_SSL_CIPHER)
-        mMessage += "\nIf the server accepts none of the ciphers offered, name others in SSL_CIPHER_LIST.";
+        return "\nIf the server accepts none of the ciphers offered, name others in SSL_CIPHER_LIST.";
+    return {};
 }
 
 }  // namespace Kdd

@@ -19,6 +19,9 @@ public:
     /// when there is one; and, when the two sides have no cipher in common, a line with the cure.
     const char* what() const noexcept override { return mMessage.c_str(); }
 
+    /// That line on its own; empty for other codes.
+    static std::string cureFor(int code);
+
 private:
     std::string mMessage;
 };

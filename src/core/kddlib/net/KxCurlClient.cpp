@@ -1,17 +1,21 @@
 #include "kddlib/net/KxCurlClient.h"
 
+#include "kddlib/Limits.h"
 #include "kddlib/net/CurlShare.h"
+#include "kddlib/net/KxCurlDownloadStream.h"
+#include "kddlib/net/KxCurlDownloadStreambuf.h"
 #include "kddlib/net/KxCurlRequest.h"
 #include "kddlib/net/PreparedRequest.h"
 #include "kddlib/net/RequestAddress.h"
 #include "kddlib/net/TlsLocks.h"
-#include "platform/base/LogFile.h"
 #include "platform/resources/ExResource.h"
 
 #include <QJsonDocument>
 #include <QJsonObject>
 
+#include <algorithm>
 #include <mutex>
+#include <utility>
 
 namespace Kdd
 {
@@ -19,6 +23,7 @@ namespace
 {
 
 constexpr std::size_t kIdleHandles = 48;
+constexpr int kFirstReadSize = 128 * 1024;  // [bytes]
 
 /// Curl and the library below it, once for the process.
 void setUpCurl()
@@ -38,6 +43,43 @@ CurlShare::Connections connectionsOfSite()
                                            : CurlShare::Connections::PerHandle;
 }
 
+bool isRangeHeader(const std::string& line)
+{
+    return qstrnicmp(line.c_str(), "range:", 6) == 0;
+}
+
+/// The rest of a stream of which nobody says how long it is, up to the bound of a response.
+QByteArray readUntilEnd(std::istream& stream)
+{
+    QByteArray bytes(kFirstReadSize, Qt::Uninitialized);
+    qint64 got = 0;
+    while (got < kMaxResponseSize && stream.read(bytes.data() + got, bytes.size() - got).gcount() > 0) {
+        got += stream.gcount();
+        if (got > bytes.size() / 2)
+            bytes.resize(static_cast<int>(qMin(2 * qint64(bytes.size()), kMaxResponseSize)));
+    }
+    bytes.resize(static_cast<int>(got));
+    return bytes;
+}
+
+/// The whole body, and what became of the transfer.
+QByteArray readWhole(KxCurlDownloadStream& stream, KxHttpStatus& status)
+{
+    const qint64 length = stream.httpStatus().failed ? 0 : stream.contentLength();
+    QByteArray bytes;
+    if (length > 0 && length <= kMaxResponseSize) {
+        bytes = QByteArray(static_cast<int>(length), Qt::Uninitialized);
+        bytes.resize(static_cast<int>(stream.read(bytes.data(), length).gcount()));
+        stream.peek();  // sees the end, with which the connection is free for the next
+    } else {
+        bytes = readUntilEnd(stream);
+    }
+    status = stream.httpStatus();
+    // No status of the server tells that reading ended at our bound.
+    status.failed |= stream.isOpen();
+    return bytes;
+}
+
 }  // namespace
 
 struct KxCurlClient::Private
@@ -55,7 +97,10 @@ struct KxCurlClient::Private
         settings.*setting = value;
     }
 
-    QByteArray transfer(const PreparedRequest& prepared, const QByteArray* body, KxHttpStatus& status) const;
+    KxCurlDownloadStream open(KxCurlDownloadRequest::Origin origin,
+                              std::optional<ByteRange> firstRange) const;
+    KxCurlDownloadStream get(const std::string& url, std::vector<std::string> headers,
+                             std::optional<ByteRange> firstRange) const;
 
     mutable std::mutex mutex;
     ClientSettings settings;
@@ -63,22 +108,25 @@ struct KxCurlClient::Private
     std::shared_ptr<KxCurlHandleFactory> handles = std::make_shared<KxCurlHandleFactory>(kIdleHandles);
 };
 
-QByteArray KxCurlClient::Private::transfer(const PreparedRequest& prepared, const QByteArray* body,
-                                           KxHttpStatus& status) const
+/// The stream once the first bytes of its response are there.
+KxCurlDownloadStream KxCurlClient::Private::open(KxCurlDownloadRequest::Origin origin,
+                                                 std::optional<ByteRange> firstRange) const
 {
-    KxCurlRequest request(handles, share, prepared.url, body ? "POST" : "GET");
-    for (const std::string& line : prepared.headers)
-        request.addHeader(line);
-    try {
-        if (body)
-            request.perform(*body);
-        else
-            request.perform();
-    } catch (const CurlError& error) {
-        LogFile::tracef(3, "CURL", "%s: %s", "transfer", error.what());
-    }
-    status = request.status();
-    return request.response();
+    origin.multi = std::make_shared<KxCurlDownloadRequest::MultiMap>(handles);
+    origin.share = &share;
+    const int concurrent = currentSettings().numConcurrentRequestsPerFile;
+    auto buffer = std::make_unique<KxCurlDownloadStreambuf>(std::move(origin), firstRange, concurrent);
+    KxCurlDownloadStream stream(buffer.release());
+    stream.peek();
+    return stream;
+}
+
+KxCurlDownloadStream KxCurlClient::Private::get(const std::string& url, std::vector<std::string> headers,
+                                                std::optional<ByteRange> firstRange) const
+{
+    KxCurlDownloadRequest::Origin origin;
+    origin.prepared = prepareRequest(url, std::move(headers), RequestBody::None, currentSettings());
+    return open(std::move(origin), firstRange);
 }
 
 KxCurlClient::KxCurlClient()
@@ -148,10 +196,35 @@ void KxCurlClient::setAuthorization(const Authorization& authorization)
     mPrivate->change(&ClientSettings::authorization, authorization);
 }
 
+KxCurlDownloadStream KxCurlClient::read(const std::string& url, bool partial)
+{
+    return read(url, {}, partial);
+}
+
+KxCurlDownloadStream KxCurlClient::read(const std::string& url, const std::vector<std::string>& headers,
+                                        bool partial)
+{
+    // Who asks for a range himself gets that range; ours would take its place.
+    const bool hasRange = std::any_of(headers.begin(), headers.end(), isRangeHeader);
+    const auto range = partial && !hasRange ? firstRange(mPrivate->currentSettings()) : std::nullopt;
+    return mPrivate->get(url, headers, range);
+}
+
+KxCurlDownloadStream KxCurlClient::readRange(const std::string& url, const std::string& range, bool partial)
+{
+    return read(url, {"Range: bytes=" + range}, partial);
+}
+
+KxCurlDownloadStream KxCurlClient::readFrom(const std::string& url, qint64 start)
+{
+    const auto range = firstRange(mPrivate->currentSettings(), start);
+    return range ? mPrivate->get(url, {}, range) : readRange(url, std::to_string(start) + '-', false);
+}
+
 QByteArray KxCurlClient::readBytes(const std::string& url, KxHttpStatus& status)
 {
-    const PreparedRequest prepared = prepareRequest(url, {}, RequestBody::None, mPrivate->currentSettings());
-    return mPrivate->transfer(prepared, nullptr, status);
+    KxCurlDownloadStream stream = read(url, true);
+    return readWhole(stream, status);
 }
 
 QJsonDocument KxCurlClient::readJson(const std::string& url, KxHttpStatus& status)
@@ -162,9 +235,13 @@ QJsonDocument KxCurlClient::readJson(const std::string& url, KxHttpStatus& statu
 QJsonDocument KxCurlClient::postBytes(const std::string& url, const QByteArray& body,
                                       const std::string& contentType, KxHttpStatus& status)
 {
-    const PreparedRequest prepared =
+    KxCurlDownloadRequest::Origin origin;
+    origin.prepared =
         prepareRequest(url, {"Content-Type: " + contentType}, RequestBody::Sent, mPrivate->currentSettings());
-    return QJsonDocument::fromJson(mPrivate->transfer(prepared, &body, status));
+    origin.body = body;
+    origin.hasBody = RequestBody::Sent;
+    KxCurlDownloadStream stream = mPrivate->open(std::move(origin), std::nullopt);
+    return QJsonDocument::fromJson(readWhole(stream, status));
 }
 
 QJsonDocument KxCurlClient::postBytes(const std::string& url, const QByteArray& body, KxHttpStatus& status)

@@ -6,6 +6,7 @@
 
 #include <functional>
 #include <string>
+#include <vector>
 
 class QJsonDocument;
 class QJsonObject;
@@ -13,6 +14,7 @@ class QJsonObject;
 namespace Kdd
 {
 
+class KxCurlDownloadStream;
 struct KxHttpStatus;
 
 /// The one way by which the library reads and writes over HTTP and HTTPS.
@@ -44,8 +46,9 @@ public:
     std::string sessionID() const;
     void setSessionID(const std::string& id);
 
-    /// How an object is fetched in ranges: the length of each [bytes], and how many at a time; below 2 it is fetched
-    /// in one piece.
+    /// How an object is fetched in ranges: the length of the first [bytes], of which the others are at most half as
+    /// long again, and how many at a time; below 2 it is fetched in one piece. A stream holds what arrives ahead of its
+    /// reader, so it takes memory for that many ranges; in one piece, 1 MiB.
     int chunkSizeForPartialRequests() const;
     void setChunkSizeForPartialRequests(int bytes);
     int numConcurrentRequestsPerFile() const;
@@ -60,6 +63,19 @@ public:
     /// passes to the caller of the request.
     using Authorization = std::function<std::string()>;
     void setAuthorization(const Authorization& authorization);
+
+    /// Opens an object and waits for the first of it. `partial`: as several ranges at a time, when the settings and the
+    /// server have it so; else in one request. `headers` are lines of name, colon, blank, value; a range among them is
+    /// fetched in one request. A server that sends something other than that range fails the transfer.
+    KxCurlDownloadStream read(const std::string& url, bool partial);
+    KxCurlDownloadStream read(const std::string& url, const std::vector<std::string>& headers, bool partial);
+
+    /// The same for a part of it: "first-last", "first-" or "-count", 0-based and inclusive.
+    KxCurlDownloadStream readRange(const std::string& url, const std::string& range, bool partial);
+
+    /// The same from a byte on (0-based) to the end, as several ranges at a time when the settings and the server have
+    /// it so. With `start` beyond 0 it fails where the server knows no ranges or not the object's length.
+    KxCurlDownloadStream readFrom(const std::string& url, qint64 start);
 
     /// The whole body, which may be up to 1 GiB; a longer one breaks off there.
     QByteArray readBytes(const std::string& url, KxHttpStatus& status);

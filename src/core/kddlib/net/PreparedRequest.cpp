@@ -45,11 +45,12 @@ PreparedRequest prepareRequest(const std::string& address, std::vector<std::stri
     return request;
 }
 
-qint64 lastByteOfFirstRange(const ClientSettings& settings)
+std::optional<ByteRange> firstRange(const ClientSettings& settings, qint64 start)
 {
     if (settings.numConcurrentRequestsPerFile < 2)
-        return -1;
-    return qMax(qint64(settings.chunkSizeForPartialRequests) - 1, kSmallestLastByte);
+        return std::nullopt;
+    return ByteRange{start,
+                     start + qMax(qint64(settings.chunkSizeForPartialRequests) - 1, kSmallestLastByte)};
 }
 
 }  // namespace Kdd

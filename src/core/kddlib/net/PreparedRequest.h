@@ -1,8 +1,9 @@
 #pragma once
 
-#include <QByteArray>
+#include "kddlib/net/ByteRange.h"
 
 #include <functional>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -42,7 +43,8 @@ std::string authorizationHeader(const ClientSettings& settings);
 /// The header lines that requests to the cloud storage carry along with `authorization`.
 std::vector<std::string> cloudHeaders(const std::string& authorization);
 
-/// The last byte (0-based) of the first range when an object is fetched in several; -1 when in one piece.
-qint64 lastByteOfFirstRange(const ClientSettings& settings);
+/// The first range when an object is fetched in several, from its byte `start` (0-based) on; nothing when it is fetched
+/// in one piece.
+std::optional<ByteRange> firstRange(const ClientSettings& settings, qint64 start = 0);
 
 }  // namespace Kdd

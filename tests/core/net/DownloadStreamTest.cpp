@@ -1,0 +1,335 @@
+#include "kddlib/net/KxCurlClient.h"
+#include "kddlib/net/KxCurlDownloadStream.h"
+#include "support/HttpServer.h"
+#include "support/LogCapture.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <condition_variable>
+#include <mutex>
+#include <random>
+
+using namespace Kdd;
+using testing::HasSubstr;
+
+namespace
+{
+
+/// Different at every place, so that a byte from the wrong one shows.
+QByteArray someObject(int size)
+{
+    QByteArray bytes(size, '\0');
+    std::minstd_rand random(static_cast<unsigned>(size));
+    for (char& byte : bytes)
+        byte = static_cast<char>(random() >> 8);
+    return bytes;
+}
+
+/// Everything, in reads of all sizes.
+QByteArray readAll(KxCurlDownloadStream& stream)
+{
+    QByteArray all;
+    QByteArray part(90'000, '\0');
+    std::minstd_rand random(1);
+    const auto isSmall = [&] { return random() % 2 == 0; };
+    while (stream.read(part.data(), static_cast<int>(random() % (isSmall() ? 50u : 90'000u)) + 1).gcount() >
+           0)
+        all.append(part.constData(), static_cast<int>(stream.gcount()));
+    return all;
+}
+
+class Download : public testing::Test
+{
+protected:
+    ~Download() override { fetchInRanges(1, 12 * 1024 * 1024); }
+
+    void fetchInRanges(int count, int length)
+    {
+        client.setNumConcurrentRequestsPerFile(count);
+        client.setChunkSizeForPartialRequests(length);
+    }
+
+    KxCurlClient& client = KxCurlClient::instance();
+};
+
+struct Site
+{
+    const char* name;
+    NginxServer::Scheme scheme;
+    const char* directives;
+    bool tellsLength;
+};
+
+const Site kSites[] = {
+    {"Ranges", NginxServer::Scheme::Http, "", true},
+    {"NoRanges", NginxServer::Scheme::Http, "max_ranges 0;", true},
+    {"Tls", NginxServer::Scheme::Https, "", true},
+    {"Http2", NginxServer::Scheme::Http2, "", true},
+    {"Chunked", NginxServer::Scheme::Http, "ssi on; ssi_types *;", false},
+    {"LimitedRate", NginxServer::Scheme::Http, "limit_rate 8m;", true},
+};
+
+class DownloadFrom : public Download, public testing::WithParamInterface<Site>
+{
+};
+
+TEST_P(DownloadFrom, GivesEveryByteWithAnyNumberOfRanges)
+{
+    const NginxServer server(GetParam().scheme, GetParam().directives);
+    const QByteArray object = someObject(1'234'567);
+    server.addFile("object", object);
+    for (const int count : {1, 2, 3, 8}) {
+        fetchInRanges(count, 100'000);
+        KxCurlDownloadStream stream = client.read(server.url("object"), true);
+        EXPECT_EQ(stream.contentLength(), GetParam().tellsLength ? object.size() : 0);
+        EXPECT_EQ(readAll(stream), object) << count;
+        EXPECT_TRUE(stream.httpStatus().ok());
+        EXPECT_FALSE(stream.isOpen());
+        KxHttpStatus status;
+        EXPECT_EQ(client.readBytes(server.url("object"), status), object) << count;
+    }
+}
+
+TEST_P(DownloadFrom, EndsWhereTheObjectDoes)
+{
+    const NginxServer server(GetParam().scheme, GetParam().directives);
+    fetchInRanges(2, 2000);
+    for (const int size : {0, 1, 1999, 2000, 2001, 4000, 4001, 5000, 7001}) {
+        server.addFile("object", someObject(size));
+        KxHttpStatus status;
+        EXPECT_EQ(client.readBytes(server.url("object"), status), someObject(size)) << size;
+        EXPECT_TRUE(status.ok()) << size;
+    }
+}
+
+INSTANTIATE_TEST_SUITE_P(Net, DownloadFrom, testing::ValuesIn(kSites),
+                         [](const auto& site) { return site.param.name; });
+
+/// Serves the ranges of one object as it should, as far as the test does not have it otherwise.
+class ObjectServer
+{
+public:
+    struct Answer
+    {
+        int code = 206;
+        qint64 first, last;
+        QByteArray total;
+        QByteArray entityTag = "\"v1\"";
+        QByteArray body;
+        bool resets = false;
+    };
+    using Spoil = std::function<void(Answer&)>;
+
+    explicit ObjectServer(QByteArray object, Spoil spoil = {})
+        : mObject(std::move(object))
+        , mSpoil(std::move(spoil))
+    {
+    }
+
+    std::string url() const { return mServer.url("object"); }
+    std::vector<QByteArray> requests() const { return mServer.requests(); }
+
+private:
+    ScriptedServer::Reply reply(const QByteArray& request) const
+    {
+        const int at = request.indexOf("\r\nRange: bytes=");
+        if (at < 0)
+            return {"HTTP/1.1 200 OK\r\nContent-Length: " + QByteArray::number(mObject.size()) + "\r\n\r\n" +
+                    mObject};
+        const QByteArray range = request.mid(at + 15, request.indexOf('\r', at + 2) - at - 15);
+        Answer answer;
+        answer.first = range.split('-').at(0).toInt();
+        answer.last = qMin(range.split('-').at(1).toInt(), mObject.size() - 1);
+        answer.total = QByteArray::number(mObject.size());
+        answer.body = mObject.mid(int(answer.first), int(answer.last - answer.first + 1));
+        if (mSpoil)
+            mSpoil(answer);
+        return {"HTTP/1.1 " + QByteArray::number(answer.code) + " -\r\nETag: " + answer.entityTag +
+                    "\r\nContent-Range: bytes " + QByteArray::number(answer.first) + '-' +
+                    QByteArray::number(answer.last) + '/' + answer.total + "\r\n\r\n" + answer.body,
+                {},
+                answer.resets};
+    }
+
+    QByteArray mObject;
+    Spoil mSpoil;
+    ScriptedServer mServer{[this](const QByteArray& request) { return reply(request); }};
+};
+
+struct LaterFault
+{
+    const char* name;
+    void (*spoil)(ObjectServer::Answer&);
+    const char* reason;
+};
+
+const LaterFault kLaterFaults[] = {
+    {"OtherEntityTag", [](auto& a) { a.entityTag = "\"v2\""; }, "has changed"},
+    {"OtherTotal", [](auto& a) { a.total = "20001"; }, "has changed"},
+    {"UnknownTotal", [](auto& a) { a.total = "*"; }, "has changed"},
+    {"WholeObject", [](auto& a) { a.code = 200; }, "code 200"},
+    {"ErrorPage", [](auto& a) { a.code = 503; }, "code 503"},
+    {"PastTheEnd", [](auto& a) { a.code = 416; }, "code 416"},
+    {"RangeIsShifted", [](auto& a) { ++a.first, ++a.last; }, "was asked for"},
+    {"RangeIsShorter", [](auto& a) { --a.last, a.body.chop(1); }, "was asked for"},
+    {"RangeIsNoRange", [](auto& a) { a.first = a.last + 1; }, "does not say which range"},
+    {"BodyIsShort", [](auto& a) { a.body.chop(1); }, "1 bytes early"},
+    {"BodyIsLong", [](auto& a) { a.body += 'x'; }, "more than the range"},
+    {"BodyIsReset", [](auto& a) { a.body.chop(9), a.resets = true; }, ""},
+};
+
+class LaterRange : public Download, public testing::WithParamInterface<LaterFault>
+{
+};
+
+TEST_P(LaterRange, FailsTheTransferWithoutAByteThatIsNotTheObjects)
+{
+    constexpr int kFaultyAt = 6000;
+    const QByteArray object = someObject(20'000);
+    const ObjectServer server(object, [](ObjectServer::Answer& answer) {
+        if (answer.first == kFaultyAt)
+            GetParam().spoil(answer);
+    });
+    for (const int count : {2, 5}) {
+        fetchInRanges(count, 2000);
+        KxCurlDownloadStream stream = client.read(server.url(), true);
+        const QByteArray got = readAll(stream);
+        EXPECT_GE(got.size(), kFaultyAt);
+        EXPECT_LT(got.size(), object.size());
+        EXPECT_TRUE(object.startsWith(got));
+        EXPECT_TRUE(stream.httpStatus().failed);
+        EXPECT_THAT(stream.failure(), HasSubstr(GetParam().reason));
+    }
+}
+
+INSTANTIATE_TEST_SUITE_P(Net, LaterRange, testing::ValuesIn(kLaterFaults),
+                         [](const auto& fault) { return fault.param.name; });
+
+TEST_F(Download, FetchesAnewInOnePieceWhatHasNoKnownLength)
+{
+    const QByteArray object = someObject(20'000);
+    const ObjectServer server(object, [](ObjectServer::Answer& answer) { answer.total = "*"; });
+    fetchInRanges(4, 2000);
+    KxCurlDownloadStream stream = client.read(server.url(), true);
+    EXPECT_EQ(readAll(stream), object);
+    EXPECT_TRUE(stream.httpStatus().ok());
+    EXPECT_EQ(server.requests().size(), 2u);
+}
+
+/// Lets requests pass only when so many are waiting, and tells whether they ever were.
+class Gate
+{
+public:
+    bool pass(int count)
+    {
+        std::unique_lock lock(mMutex);
+        ++mWaiting;
+        mChanged.notify_all();
+        return mChanged.wait_for(lock, std::chrono::seconds(20), [&] { return mWaiting >= count; });
+    }
+
+private:
+    std::mutex mMutex;
+    std::condition_variable mChanged;
+    int mWaiting = 0;
+};
+
+TEST_F(Download, HasAsManyRequestsUnderWayAsItMay)
+{
+    Gate gate;
+    const QByteArray object = someObject(8000);
+    const ObjectServer server(object, [&](ObjectServer::Answer& answer) {
+        if (answer.first > 0 && !gate.pass(3))
+            answer.code = 503;
+    });
+    fetchInRanges(3, 2000);  // the first, and three of which one takes its place
+    KxCurlDownloadStream stream = client.read(server.url(), true);
+    EXPECT_EQ(readAll(stream), object);
+    EXPECT_TRUE(stream.httpStatus().ok());
+}
+
+TEST_F(Download, StopsWhereItIsClosed)
+{
+    const ObjectServer server(someObject(40'000));
+    fetchInRanges(4, 2000);
+    KxCurlDownloadStream stream = client.read(server.url(), true);
+    stream.ignore(2001);
+    stream.close();
+    EXPECT_FALSE(stream.isOpen());
+    EXPECT_EQ(stream.httpStatus().code, 206);
+    EXPECT_EQ(stream.get(), EOF);
+}
+
+TEST_F(Download, KeepsTheCallersRange)
+{
+    fetchInRanges(4, 2000);  // which is for whole objects
+    const QByteArray object = someObject(20'000);
+    const NginxServer nginx;
+    nginx.addFile("object", object);
+    const std::pair<const char*, QByteArray> ranges[] = {
+        {"5-9000", object.mid(5, 8996)},
+        {"19990-", object.mid(19'990)},
+        {"-7", object.right(7)},
+        {"19990-30000", object.mid(19'990)},
+        {"-30000", object},
+        {"0-", object},
+    };
+    for (const auto& [range, expected] : ranges) {
+        KxCurlDownloadStream stream = client.readRange(nginx.url("object"), range, true);
+        EXPECT_EQ(readAll(stream), expected) << range;
+        EXPECT_TRUE(stream.httpStatus().ok()) << range;
+        EXPECT_EQ(stream.contentLength(), object.size());
+    }
+    KxCurlDownloadStream rest = client.readFrom(nginx.url("object"), 3000);
+    EXPECT_EQ(readAll(rest), object.mid(3000));
+    KxCurlDownloadStream none = client.readRange(nginx.url("object"), "20000-", true);
+    EXPECT_EQ(none.httpStatus().code, 416);
+}
+
+TEST_F(Download, FailsWhenTheServerSendsTheWholeForARange)
+{
+    const NginxServer nginx(NginxServer::Scheme::Http, "max_ranges 0;");
+    nginx.addFile("object", someObject(20'000));
+    for (const int count : {1, 4}) {
+        fetchInRanges(count, 2000);
+        KxCurlDownloadStream streams[] = {client.readRange(nginx.url("object"), "5-9", true),
+                                          client.readFrom(nginx.url("object"), 5)};
+        for (KxCurlDownloadStream& stream : streams) {
+            EXPECT_EQ(readAll(stream), QByteArray());
+            EXPECT_THAT(stream.failure(), HasSubstr("whole object"));
+        }
+    }
+}
+
+TEST_F(Download, OfAnErrorGivesThePageAndTheCode)
+{
+    fetchInRanges(4, 2000);
+    const NginxServer nginx;
+    KxCurlDownloadStream stream = client.read(nginx.url("absent"), true);
+    EXPECT_EQ(stream.httpStatus().code, 404);
+    EXPECT_THAT(readAll(stream).toStdString(), HasSubstr("404 Not Found"));
+    EXPECT_FALSE(stream.httpStatus().failed);
+}
+
+TEST_F(Download, CanBeMovedAndBrokenOffAtAnyPlace)
+{
+    const QByteArray object = someObject(3'000'000);
+    const NginxServer nginx;
+    nginx.addFile("object", object);
+    fetchInRanges(3, 300'000);
+    KxCurlDownloadStream kept(nullptr);
+    EXPECT_EQ(kept.get(), EOF);
+    for (const int size : {1, 40'000, 700'000}) {
+        QByteArray part(size, '\0');
+        KxCurlDownloadStream stream = client.read(nginx.url("object"), true);
+        stream.read(part.data(), size);
+        EXPECT_EQ(part, object.left(size));
+        kept = std::move(stream);  // which ends the one before
+        EXPECT_FALSE(stream.isOpen());
+    }
+    EXPECT_EQ(readAll(kept), object.mid(700'000));
+    EXPECT_TRUE(kept.httpStatus().ok());
+}
+
+}  // namespace
