@@ -62,8 +62,8 @@ const KxHttpStatus& KxCurlDownloadStream::httpStatus()
 {
     if (!mBuffer)
         return KxHttpStatus::empty();
-    if (const KxCurlDownloadRequest* request = mBuffer->currentRequest())
-        mStatus = request->status();
+    if (const KxHttpStatus* status = mBuffer->status())
+        mStatus = *status;
     return mStatus;
 }
 

@@ -40,8 +40,8 @@ public:
     /// The length of the whole object [bytes], also when a range of it is read; 0 when the server does not tell.
     qint64 contentLength() const;
 
-    /// Of the request that is being read, the last one at the end; `KxHttpStatus::empty()` without any. Valid until
-    /// the next call or move.
+    /// Of the request that is being read, or the one before while that has no answer, the last one at the end;
+    /// `KxHttpStatus::empty()` without any. Valid until the next call or move.
     const KxHttpStatus& httpStatus();
 
     /// Why a transfer counts as failed; empty while it does not.

@@ -75,8 +75,10 @@ void KxCurlDownloadStreambuf::advance()
 {
     if (mNext < mTotal)
         mRequests.push_back(nextRequest());
-    if (mRequests.size() > 1)
-        mRequests.pop_front();
+    if (mRequests.size() < 2)
+        return;
+    mFinished = mRequests.front()->status();
+    mRequests.pop_front();
 }
 
 KxCurlDownloadStreambuf::Request KxCurlDownloadStreambuf::nextRequest()
@@ -132,6 +134,15 @@ void KxCurlDownloadStreambuf::close()
 {
     mRequests.clear();
     setg(nullptr, nullptr, nullptr);
+}
+
+const KxHttpStatus* KxCurlDownloadStreambuf::status()
+{
+    const KxCurlDownloadRequest* request = currentRequest();
+    if (!request)
+        return nullptr;
+    const bool isAnswered = request->status().code != 0 || request->status().failed;
+    return isAnswered ? &request->status() : &mFinished;
 }
 
 qint64 KxCurlDownloadStreambuf::contentLength()

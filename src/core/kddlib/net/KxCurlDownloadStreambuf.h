@@ -37,6 +37,10 @@ public:
     /// The request whose bytes come next; null once closed. Here ranges are planned, and finished ones replaced.
     virtual KxCurlDownloadRequest* currentRequest();
 
+    /// Of the current request; while that has no answer, of the one before it. Null once closed. Valid until the next
+    /// call of anything.
+    const KxHttpStatus* status();
+
     /// The length of the whole object [bytes]; 0 when the server does not tell, which is logged once.
     qint64 contentLength();
 
@@ -56,6 +60,7 @@ private:
     std::vector<char> mGetBuffer;
     bool mPlanned = false;
     std::deque<Request> mRequests;  // in the order of the object
+    KxHttpStatus mFinished;         // of the last request that was read to its end
     qint64 mNext = 0;               // first byte that no request has been made for
     qint64 mTotal = 0;
     ObjectVersion mVersion;
