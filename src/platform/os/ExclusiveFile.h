@@ -1,5 +1,7 @@
 #pragma once
 
+#include "platform/base/Export.h"
+
 #include <QString>
 
 class QFile;
@@ -48,8 +50,8 @@ LockedOpenResult openLocked(const QString& path, FileLock lock, IfAbsent ifAbsen
 /// The same into `file`, which has to be closed: Shared opens it read-only, Exclusive for reading and writing. The
 /// descriptor in the result belongs to `file` then, and closing `file` ends the lock. As always with a QFile that is
 /// opened by descriptor, its fileName() is empty afterwards. On failure `file` stays closed.
-LockedOpenResult openLockedFile(QFile& file, const QString& path, FileLock lock, IfAbsent ifAbsent,
-                                LockPolling polling);
+KDD_EXPORT LockedOpenResult openLockedFile(QFile& file, const QString& path, FileLock lock, IfAbsent ifAbsent,
+                                           LockPolling polling);
 
 /// Deletes the file at `path`, which `lockedFile` holds exclusively, and closes `lockedFile` in any case. False, with
 /// the reason in errno, when the system refuses; a file that is gone already counts as deleted.

@@ -12,6 +12,7 @@ struct GlobalOptions
 {
     bool json = false;     ///< one machine-readable result on standard output
     bool quiet = false;    ///< no progress, only errors
+    bool flush = false;    ///< written files are on disk before they count as written
     bool verbose = false;  ///< names everything that is passed over
     QString store;         ///< the folder of everything that is kept
 };
@@ -65,6 +66,13 @@ struct StackRequest
     bool again = false;  ///< also series that have volume files already
 };
 
+struct GetRequest
+{
+    QByteArray url;
+    QString file;  ///< or the folder; empty: the URL's own name
+    int parallel = 1;
+};
+
 struct SampleRequest
 {
     QString folder;
@@ -85,6 +93,7 @@ Outcome runStat(const GlobalOptions& options, const QByteArray& study);
 Outcome runDiff(const GlobalOptions& options, const QString& left, const QString& right);
 Outcome runVerify(const GlobalOptions& options, const StudySelection& selection);
 Outcome runDelete(const GlobalOptions& options, const NodeSelection& selection);
+Outcome runGet(const GlobalOptions& options, const GetRequest& request);
 Outcome runSample(const GlobalOptions& options, const SampleRequest& request);
 
 }  // namespace Kdd

@@ -1,5 +1,7 @@
 #include "tools/kdd/Progress.h"
 
+#include "tools/kdd/Report.h"
+
 #include <unistd.h>
 
 #include <cstdio>
@@ -15,9 +17,10 @@ constexpr std::chrono::milliseconds kRedrawAfter(80);
 
 }  // namespace
 
-Progress::Progress(const char* what, bool isWanted)
+Progress::Progress(const char* what, bool isWanted, Unit unit)
     : mWhat(what)
     , mIsDrawn(isWanted && isatty(STDERR_FILENO) == 1)
+    , mUnit(unit)
 {
 }
 
@@ -27,19 +30,30 @@ Progress::~Progress()
         std::fprintf(stderr, "\r\033[K");
 }
 
+QString Progress::countText(double count) const
+{
+    return mUnit == Unit::Bytes ? humanBytes(static_cast<qint64>(count)) : QString::number(count, 'f', 0);
+}
+
 void Progress::show(qint64 done, qint64 total)
 {
     const Clock::time_point now = Clock::now();
-    if (!mIsDrawn || total <= 0 || (now - mLast < kRedrawAfter && done < total))
+    if (!mIsDrawn || (now - mLast < kRedrawAfter && done != total))
         return;
     mLast = now;
     const double seconds = std::chrono::duration<double>(now - mStart).count();
     const double rate = seconds > 0 ? static_cast<double>(done) / seconds : 0;
+    const QString rateText = countText(rate) + QStringLiteral("/s");
+    const QString doneText = countText(static_cast<double>(done));
+    if (total <= 0) {
+        std::fprintf(stderr, "\r\033[K%s %s  %s", mWhat, qUtf8Printable(doneText), qUtf8Printable(rateText));
+        return;
+    }
     const double left = rate > 0 ? static_cast<double>(total - done) / rate : 0;
     const QByteArray bar(static_cast<int>(kBarWidth * done / total), '#');
-    std::fprintf(stderr, "\r\033[K%s [%-*s] %3d%%  %lld/%lld  %.0f/s  %.0f s left", mWhat, kBarWidth,
-                 bar.constData(), static_cast<int>(100 * done / total), static_cast<long long>(done),
-                 static_cast<long long>(total), rate, left);
+    std::fprintf(stderr, "\r\033[K%s [%-*s] %3d%%  %s/%s  %s  %.0f s left", mWhat, kBarWidth, bar.constData(),
+                 static_cast<int>(100 * done / total), qUtf8Printable(doneText),
+                 qUtf8Printable(countText(static_cast<double>(total))), qUtf8Printable(rateText), left);
 }
 
 }  // namespace Kdd

@@ -12,18 +12,24 @@ namespace Kdd
 class Progress
 {
 public:
-    Progress(const char* what, bool isWanted);
+    enum class Unit { Pieces, Bytes };
+
+    Progress(const char* what, bool isWanted, Unit unit = Unit::Pieces);
     ~Progress();
     Progress(const Progress&) = delete;
     Progress& operator=(const Progress&) = delete;
 
+    /// A total of 0 is one that is not known.
     void show(qint64 done, qint64 total);
 
 private:
     using Clock = std::chrono::steady_clock;
 
+    QString countText(double count) const;
+
     const char* mWhat;
     bool mIsDrawn;
+    Unit mUnit;
     Clock::time_point mStart = Clock::now();
     Clock::time_point mLast;
 };

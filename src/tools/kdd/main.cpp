@@ -30,7 +30,6 @@ struct StoreOptions
     std::string database;
     std::string meta;
     TagFile::CompressionMode compression = TagFile::CompressionMode::Zlib;
-    bool flush = false;
 };
 
 /// A result that could not be written is none.
@@ -72,7 +71,7 @@ void addGlobalOptions(CLI::App& app, GlobalOptions& global, StoreOptions& store)
     app.add_option("--compression", store.compression, "How tag files are written: none, zlib or lzma")
         ->transform(CLI::CheckedTransformer(kCompressionNames, CLI::ignore_case))
         ->envname("KDD_COMPRESSION");
-    app.add_flag("--flush", store.flush, "Flush every write to disk, against power loss")
+    app.add_flag("--flush", global.flush, "Flush every write to disk, against power loss")
         ->envname("KDD_FLUSH");
     app.add_flag("--json", global.json, "Machine-readable result on standard output");
     app.add_flag("--quiet", global.quiet, "No progress, only errors");
@@ -113,7 +112,7 @@ void applyStore(GlobalOptions& global, const StoreOptions& store)
         firstOf({bytes(store.database), ExResource::databaseAddress(), "sqlite:" + root + "/kdd.sqlite"}));
     TagFile::setMetaFolder(meta.constData());
     TagFile::setCompressionMode(store.compression);
-    if (store.flush)
+    if (global.flush)
         TagFile::setDurability(TagFile::Durability::PowerLoss);
 }
 
@@ -147,6 +146,7 @@ public:
         declareStoring();
         declareReading();
         declareChecking();
+        declareTransfers();
     }
 
 private:
@@ -250,6 +250,16 @@ private:
                            [this] { return runVerify(mGlobal, studies()); }));
     }
 
+    void declareTransfers()
+    {
+        CLI::App& get = declare("get", "Fetch an object over HTTP(S) or from the cloud storage", [this] {
+            return runGet(mGlobal, {bytes(mUrl), path(mFile), mParallel});
+        });
+        get.add_option("URL", mUrl, "http://, https:// or gs://")->required();
+        get.add_option("-o,--output", mFile, "File or folder to write to (default: the URL's own name)");
+        get.add_option("--parallel", mParallel, "Ranges fetched at a time")->check(CLI::Range(1, 64));
+    }
+
     PreviewsRequest previewsRequest() const
     {
         QList<QByteArray> names = paths();
@@ -264,6 +274,9 @@ private:
     std::vector<std::string> mPaths;
     NodeArguments mNode;
     std::string mFolder;
+    std::string mUrl;
+    std::string mFile;
+    int mParallel = 4;
     int mImages = 400;
     unsigned mSeed = 1;
     bool mOwn = false;

@@ -1,7 +1,7 @@
 #include "kddlib/net/KxCurlClient.h"
 #include "kddlib/net/KxCurlDownloadStream.h"
 #include "support/HttpServer.h"
-#include "support/LogCapture.h"
+#include "support/ObjectServer.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -15,16 +15,6 @@ using testing::HasSubstr;
 
 namespace
 {
-
-/// Different at every place, so that a byte from the wrong one shows.
-QByteArray someObject(int size)
-{
-    QByteArray bytes(size, '\0');
-    std::minstd_rand random(static_cast<unsigned>(size));
-    for (char& byte : bytes)
-        byte = static_cast<char>(random() >> 8);
-    return bytes;
-}
 
 /// Everything, in reads of all sizes.
 QByteArray readAll(KxCurlDownloadStream& stream)
@@ -105,57 +95,6 @@ TEST_P(DownloadFrom, EndsWhereTheObjectDoes)
 
 INSTANTIATE_TEST_SUITE_P(Net, DownloadFrom, testing::ValuesIn(kSites),
                          [](const auto& site) { return site.param.name; });
-
-/// Serves the ranges of one object as it should, as far as the test does not have it otherwise.
-class ObjectServer
-{
-public:
-    struct Answer
-    {
-        int code = 206;
-        qint64 first, last;
-        QByteArray total;
-        QByteArray entityTag = "\"v1\"";
-        QByteArray body;
-        bool resets = false;
-    };
-    using Spoil = std::function<void(Answer&)>;
-
-    explicit ObjectServer(QByteArray object, Spoil spoil = {})
-        : mObject(std::move(object))
-        , mSpoil(std::move(spoil))
-    {
-    }
-
-    std::string url() const { return mServer.url("object"); }
-    std::vector<QByteArray> requests() const { return mServer.requests(); }
-
-private:
-    ScriptedServer::Reply reply(const QByteArray& request) const
-    {
-        const int at = request.indexOf("\r\nRange: bytes=");
-        if (at < 0)
-            return {"HTTP/1.1 200 OK\r\nContent-Length: " + QByteArray::number(mObject.size()) + "\r\n\r\n" +
-                    mObject};
-        const QByteArray range = request.mid(at + 15, request.indexOf('\r', at + 2) - at - 15);
-        Answer answer;
-        answer.first = range.split('-').at(0).toInt();
-        answer.last = qMin(range.split('-').at(1).toInt(), mObject.size() - 1);
-        answer.total = QByteArray::number(mObject.size());
-        answer.body = mObject.mid(int(answer.first), int(answer.last - answer.first + 1));
-        if (mSpoil)
-            mSpoil(answer);
-        return {"HTTP/1.1 " + QByteArray::number(answer.code) + " -\r\nETag: " + answer.entityTag +
-                    "\r\nContent-Range: bytes " + QByteArray::number(answer.first) + '-' +
-                    QByteArray::number(answer.last) + '/' + answer.total + "\r\n\r\n" + answer.body,
-                {},
-                answer.resets};
-    }
-
-    QByteArray mObject;
-    Spoil mSpoil;
-    ScriptedServer mServer{[this](const QByteArray& request) { return reply(request); }};
-};
 
 struct LaterFault
 {

@@ -1,5 +1,7 @@
 #pragma once
 
+#include "platform/base/Export.h"
+
 #include <string>
 
 namespace Kdd
@@ -9,7 +11,7 @@ struct KxHttpStatus;
 
 /// Tells one version of an object from the next by what the server says of it, so that parts fetched one after another
 /// are never put together from two of them. A value.
-struct ObjectVersion
+struct KDD_EXPORT ObjectVersion
 {
     std::string entityTag;
     std::string generation;  // of the cloud storage; counts up with each write
@@ -23,7 +25,7 @@ struct ObjectVersion
 };
 
 /// Whether nothing speaks against both being the same object. Of two that tell nothing, nothing does.
-bool operator==(const ObjectVersion& a, const ObjectVersion& b);
+KDD_EXPORT bool operator==(const ObjectVersion& a, const ObjectVersion& b);
 inline bool operator!=(const ObjectVersion& a, const ObjectVersion& b)
 {
     return !(a == b);

@@ -1,0 +1,205 @@
+#include "kddlib/net/KxCurlClient.h"
+#include "kddlib/net/KxCurlDownloadStream.h"
+#include "platform/base/LogFile.h"
+#include "tools/kdd/Commands.h"
+#include "tools/kdd/PartialFile.h"
+#include "tools/kdd/Progress.h"
+#include "tools/kdd/Report.h"
+
+#include <QFileInfo>
+#include <QUrl>
+
+#include <cstdio>
+#include <memory>
+
+namespace Kdd
+{
+
+namespace
+{
+
+constexpr std::size_t kBlock = 1024 * 1024;  // [bytes]
+
+/// Longer ranges leave connections idle at the end of an object, shorter ones spend more time on asking.
+constexpr int kRange = 8 * 1024 * 1024;  // [bytes]
+
+/// The last part of the URL's path; empty when it ends in "/".
+QString nameInUrl(const QByteArray& url)
+{
+    const QByteArray path = url.split('?').first().mid(url.indexOf(':') + 1);
+    return QUrl::fromPercentEncoding(path.mid(path.lastIndexOf('/') + 1))
+        .replace(QLatin1Char('/'), QLatin1Char('_'));
+}
+
+/// Where to write to; empty, with the reason logged, when the name is left to us and there is none.
+QString targetOf(const GetRequest& request)
+{
+    const bool isFolder = QFileInfo(request.file).isDir();
+    if (!request.file.isEmpty() && !isFolder)
+        return request.file;
+    const QString name = nameInUrl(request.url);
+    if (name.isEmpty() || name == QLatin1String(".") || name == QLatin1String("..")) {
+        LogFile::errorf("%s has no file name: give one with -o", request.url.constData());
+        return {};
+    }
+    return isFolder ? request.file + QLatin1Char('/') + name : name;
+}
+
+/// One object on its way into a file.
+class Fetch
+{
+public:
+    Fetch(const GetRequest& request, const GlobalOptions& options, PartialFile& file)
+        : mRequest(request)
+        , mOptions(options)
+        , mFile(file)
+    {
+    }
+
+    /// False, with the reason logged, when not everything is in the file.
+    bool run() { return begin() && copy() && isComplete(); }
+
+    qint64 resumedAt() const { return mResumedAt; }
+
+private:
+    bool begin();
+    bool goOn();
+    bool beginAnew();
+    bool hasContent();
+    bool copy();
+    bool isComplete();
+    bool explain();
+
+    PartialFile::Origin origin()
+    {
+        return {mRequest.url, ObjectVersion::of(mStream.httpStatus()), mStream.contentLength()};
+    }
+
+    const GetRequest& mRequest;
+    const GlobalOptions& mOptions;
+    PartialFile& mFile;
+    KxCurlDownloadStream mStream{nullptr};
+    qint64 mResumedAt = 0;
+    qint64 mDone = 0;
+    qint64 mLength = 0;  // 0: not known
+};
+
+/// Whether bytes of the object, or its end, are next. A transfer may have broken off already and still have some.
+bool Fetch::hasContent()
+{
+    const KxHttpStatus& status = mStream.httpStatus();
+    return status.ok() || (status.code / 100 == 2 && mStream.peek() != std::istream::traits_type::eof());
+}
+
+bool Fetch::begin()
+{
+    if (!goOn() && !beginAnew())
+        return false;
+    mDone = mResumedAt;
+    mLength = mStream.contentLength();
+    return true;
+}
+
+/// False when there is nothing to go on with, or the server does not have that any more.
+bool Fetch::goOn()
+{
+    const PartialFile::Origin known = mFile.origin();
+    const qint64 size = mFile.size();
+    if (!known.isRecognisable() || known.url != mRequest.url || size == 0 || size >= known.length)
+        return false;
+    mStream = KxCurlClient::instance().readFrom(mRequest.url.toStdString(), size);
+    const bool isSame = hasContent() && origin().version == known.version && origin().length == known.length;
+    if (isSame && mFile.goToEnd())
+        mResumedAt = size;
+    return mResumedAt > 0;
+}
+
+bool Fetch::beginAnew()
+{
+    mStream = KxCurlClient::instance().read(mRequest.url.toStdString(), true);
+    // A page that tells of an error never gets into the file, and what was fetched before stays.
+    return hasContent() ? mFile.startOver(origin()) : explain();
+}
+
+bool Fetch::explain()
+{
+    const KxHttpStatus& status = mStream.httpStatus();
+    if (status.failed)
+        LogFile::errorf("%s cannot be fetched: %s", mRequest.url.constData(), mStream.failure().c_str());
+    else
+        LogFile::errorf("%s cannot be fetched: HTTP response code %d", mRequest.url.constData(), status.code);
+    return false;
+}
+
+bool Fetch::copy()
+{
+    Progress progress("Fetching", !mOptions.quiet, Progress::Unit::Bytes);
+    const auto block = std::make_unique<char[]>(kBlock);
+    while (mStream.read(block.get(), kBlock).gcount() > 0) {
+        if (!mFile.append(block.get(), mStream.gcount()))
+            return false;
+        mDone += mStream.gcount();
+        progress.show(mDone, mLength);
+    }
+    return true;
+}
+
+bool Fetch::isComplete()
+{
+    if (!mStream.httpStatus().ok())
+        return explain();
+    if (mLength > 0 && mDone != mLength) {
+        LogFile::errorf("%s cannot be fetched: %lld of %lld bytes came", mRequest.url.constData(),
+                        static_cast<long long>(mDone), static_cast<long long>(mLength));
+        return false;
+    }
+    return true;
+}
+
+void report(const GlobalOptions& options, const GetRequest& request, const QString& target, qint64 bytes,
+            qint64 resumedAt)
+{
+    if (options.json)
+        printJson({{QStringLiteral("url"), QString::fromUtf8(request.url)},
+                   {QStringLiteral("file"), target},
+                   {QStringLiteral("bytes"), bytes},
+                   {QStringLiteral("resumedAt"), resumedAt}});
+    else if (!options.quiet)
+        std::printf("%s: %s%s\n", qUtf8Printable(target), qUtf8Printable(humanBytes(bytes)),
+                    resumedAt > 0 ? qUtf8Printable(QStringLiteral(", of which ") + humanBytes(resumedAt) +
+                                                   QStringLiteral(" were there"))
+                                  : "");
+}
+
+}  // namespace
+
+Outcome runGet(const GlobalOptions& options, const GetRequest& request)
+{
+    if (!KxCurlClient::isUrl(request.url.constData())) {
+        LogFile::errorf("%s is no address: it begins with http://, https:// or gs://",
+                        request.url.constData());
+        return Outcome::WrongUsage;
+    }
+    const QString target = targetOf(request);
+    if (target.isEmpty())
+        return Outcome::WrongUsage;
+    PartialFile file(target);
+    if (!file.open())
+        return Outcome::Failed;
+    KxCurlClient::instance().setNumConcurrentRequestsPerFile(request.parallel);
+    KxCurlClient::instance().setChunkSizeForPartialRequests(kRange);
+    Fetch fetch(request, options, file);
+    if (!fetch.run()) {
+        file.removeIfEmpty();
+        if (file.origin().isRecognisable())
+            LogFile::warnf("%s is kept: the same command goes on from there", qUtf8Printable(file.path()));
+        return Outcome::Failed;
+    }
+    const qint64 bytes = file.size();
+    if (!file.publish(options.flush))
+        return Outcome::Failed;
+    report(options, request, target, bytes, fetch.resumedAt());
+    return Outcome::Done;
+}
+
+}  // namespace Kdd

@@ -1,0 +1,142 @@
+#include "tools/kdd/PartialFile.h"
+
+#include "platform/base/LogFile.h"
+#include "platform/os/ExclusiveFile.h"
+
+#include <QJsonDocument>
+#include <QJsonObject>
+#include <QSaveFile>
+
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdio>
+#include <cstring>
+
+namespace Kdd
+{
+
+namespace
+{
+
+const QString kUrl = QStringLiteral("url");
+const QString kEntityTag = QStringLiteral("etag");
+const QString kGeneration = QStringLiteral("generation");
+const QString kLastModified = QStringLiteral("lastModified");
+const QString kLength = QStringLiteral("length");
+const QString kBoot = QStringLiteral("boot");
+
+constexpr qint64 kLongestRecord = 64 * 1024;  // [bytes]
+
+/// Another one after each start of the machine.
+QString bootId()
+{
+    QFile file(QStringLiteral("/proc/sys/kernel/random/boot_id"));
+    return file.open(QIODevice::ReadOnly) ? QString::fromLatin1(file.readAll().trimmed()) : QString();
+}
+
+QString text(const std::string& bytes)
+{
+    return QString::fromStdString(bytes);
+}
+
+std::string bytes(const QJsonValue& value)
+{
+    return value.toString().toStdString();
+}
+
+}  // namespace
+
+PartialFile::PartialFile(const QString& target)
+    : mTarget(target)
+{
+}
+
+bool PartialFile::refuse(const char* action, const QString& reason) const
+{
+    LogFile::errorf("%s %s: %s", qUtf8Printable(path()), action, qUtf8Printable(reason));
+    return false;
+}
+
+bool PartialFile::open()
+{
+    const LockedOpenResult result =
+        openLockedFile(mFile, path(), FileLock::Exclusive, IfAbsent::Create, LockPolling{1, 0});
+    if (result)
+        return true;
+    if (result.failure == OpenFailure::Locked)
+        return refuse("cannot be opened", QStringLiteral("another process is fetching it"));
+    return refuse("cannot be opened", QString::fromLocal8Bit(std::strerror(result.systemError)));
+}
+
+PartialFile::Origin PartialFile::origin() const
+{
+    QFile record(recordPath());
+    if (!record.open(QIODevice::ReadOnly))
+        return {};
+    const QJsonObject object = QJsonDocument::fromJson(record.read(kLongestRecord)).object();
+    if (object[kBoot].toString() != bootId())
+        return {};
+    return {object[kUrl].toString().toUtf8(),
+            {bytes(object[kEntityTag]), bytes(object[kGeneration]), bytes(object[kLastModified])},
+            object[kLength].toString().toLongLong()};
+}
+
+bool PartialFile::startOver(const Origin& origin)
+{
+    // In this order, so that at no moment the record tells of other bytes than those that are there.
+    QFile::remove(recordPath());
+    if (!mFile.resize(0) || !mFile.seek(0))
+        return refuse("cannot be emptied", mFile.errorString());
+    if (!origin.isRecognisable())
+        return true;
+    const QJsonObject object{
+        {kUrl, QString::fromUtf8(origin.url)},          {kEntityTag, text(origin.version.entityTag)},
+        {kGeneration, text(origin.version.generation)}, {kLastModified, text(origin.version.lastModified)},
+        {kLength, QString::number(origin.length)},      {kBoot, bootId()}};
+    QSaveFile record(recordPath());
+    if (record.open(QIODevice::WriteOnly) && record.write(QJsonDocument(object).toJson()) > 0 &&
+        record.commit())
+        return true;
+    return refuse("cannot be described", record.errorString());
+}
+
+bool PartialFile::goToEnd()
+{
+    return mFile.seek(mFile.size()) || refuse("cannot be continued", mFile.errorString());
+}
+
+/// Without Qt's buffer: the parts are large already.
+bool PartialFile::append(const char* bytes, qint64 count)
+{
+    while (count > 0) {
+        const ssize_t written = ::write(mFile.handle(), bytes, static_cast<std::size_t>(count));
+        if (written < 0 && errno == EINTR)
+            continue;
+        if (written <= 0)
+            return refuse("cannot be written", QString::fromLocal8Bit(std::strerror(errno)));
+        bytes += written;
+        count -= written;
+    }
+    return true;
+}
+
+bool PartialFile::publish(bool flush)
+{
+    const bool isOnDisk = !flush || ::fsync(mFile.handle()) == 0;
+    if (!isOnDisk ||
+        std::rename(QFile::encodeName(path()).constData(), QFile::encodeName(mTarget).constData()) != 0)
+        return refuse("cannot be given its name", QString::fromLocal8Bit(std::strerror(errno)));
+    QFile::remove(recordPath());
+    return true;
+}
+
+void PartialFile::removeIfEmpty()
+{
+    if (mFile.isOpen() && mFile.size() == 0) {
+        QFile::remove(recordPath());
+        QFile::remove(path());
+    }
+}
+
+}  // namespace Kdd

@@ -1,0 +1,128 @@
+#include "CommandLineFixture.h"
+#include "support/HttpServer.h"
+#include "support/ObjectServer.h"
+
+#include <sys/file.h>
+
+#include <atomic>
+
+using namespace Kdd;
+
+namespace
+{
+
+class Get : public CommandLine
+{
+protected:
+    Get() { QDir().mkpath(images()); }
+
+    /// Into the folder of images, under the URL's own name.
+    Answer get(const std::string& url, const char* options = "get --json") const
+    {
+        return kdd(options, QStringList{QString::fromStdString(url), QStringLiteral("-o"), images()});
+    }
+
+    QByteArray fetched(const char* name) const
+    {
+        QFile content(file(name));
+        return content.open(QIODevice::ReadOnly) ? content.readAll() : QByteArray("absent");
+    }
+
+    QStringList names() const { return QDir(images()).entryList(QDir::Files); }
+};
+
+TEST_F(Get, WritesTheObjectUnderItsName)
+{
+    const NginxServer server;
+    const QByteArray object = someObject(20'000'000);
+    server.addFile("a.dcm", object);
+    server.addFile("empty", {});
+    const Answer answer = get(server.url("a.dcm?x=1"));
+    EXPECT_EQ(answer.exitCode, 0);
+    EXPECT_EQ(answer.number("bytes"), object.size());
+    EXPECT_EQ(fetched("a.dcm"), object);
+    EXPECT_EQ(get(server.url("empty")).exitCode, 0);
+    EXPECT_EQ(fetched("empty"), "");
+    EXPECT_EQ(names(), (QStringList{QStringLiteral("a.dcm"), QStringLiteral("empty")}));
+}
+
+TEST_F(Get, LeavesNothingOfAnErrorPage)
+{
+    const NginxServer server;
+    put("absent", "from before");
+    const Answer answer = get(server.url("absent"));
+    EXPECT_EQ(answer.exitCode, 1);
+    EXPECT_TRUE(answer.err.contains("HTTP response code 404")) << answer.err.toStdString();
+    EXPECT_EQ(fetched("absent"), "from before");
+    EXPECT_EQ(names().size(), 1);
+    EXPECT_EQ(get("http://127.0.0.1:1/x").exitCode, 1);
+    EXPECT_EQ(get("ftp://a/b").exitCode, 2);
+    EXPECT_EQ(get(server.url("")).exitCode, 2);
+}
+
+/// Cuts every body short until it is told to stop; then gives all, of one version or the other.
+class Resumed : public Get
+{
+protected:
+    std::atomic<bool> cuts{true};
+    std::atomic<bool> changed{false};
+    const QByteArray object = someObject(3'000'000);
+    const ObjectServer server{object, [this](ObjectServer::Answer& answer) {
+                                  if (cuts)
+                                      answer.body.chop(1'000'000);
+                                  if (changed)
+                                      answer.entityTag = "\"v2\"";
+                              }};
+};
+
+TEST_F(Resumed, GoesOnWhereTheRunBeforeEnded)
+{
+    const Answer broken = get(server.url());
+    EXPECT_EQ(broken.exitCode, 1);
+    EXPECT_TRUE(broken.err.contains("1000000 bytes early")) << broken.err.toStdString();
+    EXPECT_EQ(fetched("object"), "absent");
+    EXPECT_EQ(fetched("object.part"), object.left(2'000'000));
+    cuts = false;
+    const Answer answer = get(server.url());
+    EXPECT_EQ(answer.exitCode, 0) << answer.err.toStdString();
+    EXPECT_EQ(answer.number("resumedAt"), 2'000'000);
+    EXPECT_TRUE(server.requests().back().contains("Range: bytes=2000000-"));
+    EXPECT_EQ(fetched("object"), object);
+    EXPECT_EQ(names(), QStringList{QStringLiteral("object")});
+}
+
+TEST_F(Resumed, BeginsAnewWhenTheObjectIsAnother)
+{
+    EXPECT_EQ(get(server.url()).exitCode, 1);
+    cuts = false;
+    changed = true;
+    const Answer answer = get(server.url());
+    EXPECT_EQ(answer.number("resumedAt"), 0);
+    EXPECT_EQ(fetched("object"), object);
+}
+
+TEST_F(Resumed, KeepsWhatItHasWhenTheDiskIsFull)
+{
+    cuts = false;
+    const Answer full = finish(*start(
+        "get --json", {QString::fromStdString(server.url()), QStringLiteral("-o"), images()}, 1'000'000));
+    EXPECT_EQ(full.exitCode, 1);
+    EXPECT_TRUE(full.err.contains("object.part cannot be written: File too large")) << full.err.toStdString();
+    EXPECT_EQ(get(server.url()).number("resumedAt"), 1'000'000);
+    EXPECT_EQ(fetched("object"), object);
+}
+
+TEST_F(Resumed, LeavesTheFileToTheProcessThatFetchesIt)
+{
+    EXPECT_EQ(get(server.url()).exitCode, 1);
+    QFile part(file("object.part"));
+    ASSERT_TRUE(part.open(QIODevice::ReadOnly));
+    ASSERT_EQ(::flock(part.handle(), LOCK_EX), 0);
+    cuts = false;
+    const Answer answer = get(server.url());
+    EXPECT_EQ(answer.exitCode, 1);
+    EXPECT_TRUE(answer.err.contains("another process is fetching it")) << answer.err.toStdString();
+    EXPECT_EQ(fetched("object.part"), object.left(2'000'000));
+}
+
+}  // namespace
