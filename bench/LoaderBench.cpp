@@ -6,10 +6,15 @@
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 
+#include <QDataStream>
+
 #include <benchmark/benchmark.h>
 #include <dcmtk/dcmdata/dctk.h>
 
-#include <utility>
+#include <algorithm>
+#include <cstdlib>
+#include <random>
+#include <string>
 #include <vector>
 
 namespace Kdd
@@ -18,28 +23,59 @@ namespace Kdd
 namespace
 {
 
-/// One image after the other, as a viewer asks for them, and one attribute of each.
-void loadMetaData(benchmark::State& state)
+/// The study as a server holds it: read from its tag file.
+std::shared_ptr<TagFile> servedStudy()
 {
-    const std::shared_ptr<TagFile> study =
+    const std::unique_ptr<TagFile> built =
         thousandImages().study(static_cast<int>(thousandImages().files().size()));
-    Loader loader;
-    loader.addTagFile("study", study);
-    std::vector<std::pair<QByteArray, QByteArray>> images;  // SOP Instance UID and path
-    for (auto it = study->imagesByUID().cbegin(); it != study->imagesByUID().cend(); ++it) {
+    built->optimizeAll();
+    QByteArray bytes;
+    QDataStream out(&bytes, QIODevice::WriteOnly);
+    QDataStream in(&bytes, QIODevice::ReadOnly);
+    auto served = std::make_shared<TagFile>();
+    if (!built->writeCacheFile(out) || !served->readCacheFile(in, nullptr))
+        std::abort();
+    return served;
+}
+
+/// Under which paths the images are asked for.
+std::vector<QByteArray> servedPaths(const TagFile& study, bool isShuffled)
+{
+    std::vector<QByteArray> paths;
+    for (auto it = study.imagesByUID().cbegin(); it != study.imagesByUID().cend(); ++it) {
         QByteArray suffix;
         it.value()->findAndGetString(kFileSuffix, suffix);
-        images.emplace_back(it.key(), "/archive/study/" + it.key() + '_' + suffix + ".dcm");
+        paths.push_back("/archive/" + study.studyInstanceUID() + '/' + it.key() + '_' + suffix + ".dcm");
     }
+    if (isShuffled)
+        std::shuffle(paths.begin(), paths.end(), std::mt19937());
+    return paths;
+}
+
+/// The name of the patient, as a first look into what was answered.
+template <typename Dataset>
+void readName(Dataset& dataset)
+{
+    OFString name;
+    dataset.findAndGetOFString(DCM_PatientName, name);
+    benchmark::DoNotOptimize(name);
+}
+
+/// One image after the other, and with `read` one attribute of each.
+void loadMetaData(benchmark::State& state)
+{
+    const std::shared_ptr<TagFile> study = servedStudy();
+    Loader loader;
+    loader.addTagFile(study->studyInstanceUID(), study);
+    const std::vector<QByteArray> paths = servedPaths(*study, state.range(0) != 0);
+    const bool isRead = state.range(1) != 0;
     std::size_t next = 0;
     for (auto step : state) {
-        const auto& image = images.at(next);
-        const std::shared_ptr<Item> item =
-            loader.loadMetaData(image.second.constData(), image.first, "study");
-        OFString name;
-        item->findAndGetOFString(DCM_PatientName, name);
-        benchmark::DoNotOptimize(name);
-        next = (next + 1) % images.size();
+        const std::shared_ptr<Item> item = loader.loadMetaData(paths[next].constData());
+        benchmark::DoNotOptimize(item);
+        if (isRead)
+            readName(*item);
+        next = (next + 1) % paths.size();
     }
     state.SetItemsProcessed(static_cast<int64_t>(state.iterations()));
 }
@@ -51,15 +87,13 @@ void openDicomFile(benchmark::State& state)
     for (auto step : state) {
         DcmFileFormat file;
         file.loadFile(files.at(next).c_str());
-        OFString name;
-        file.getDataset()->findAndGetOFString(DCM_PatientName, name);
-        benchmark::DoNotOptimize(name);
+        readName(*file.getDataset());
         next = (next + 1) % files.size();
     }
     state.SetItemsProcessed(static_cast<int64_t>(state.iterations()));
 }
 
-BENCHMARK(loadMetaData);
+BENCHMARK(loadMetaData)->ArgNames({"shuffled", "read"})->ArgsProduct({{0, 1}, {0, 1}});
 BENCHMARK(openDicomFile);
 
 }  // namespace

@@ -2,6 +2,7 @@
 
 #include "kddlib/items/kdditem.h"
 #include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/Volume.h"
@@ -68,6 +69,19 @@ TEST_F(LoaderTest, TheTagFileAnswersAndTheFileIsReadForAllElse)
     OFString name;
     cached->obtainDcmDataset()->findAndGetOFString(DCM_PatientName, name);
     EXPECT_EQ(name, "of^file");
+}
+
+TEST_F(LoaderTest, AnImageLiesWhereItWasLastAskedFor)
+{
+    add("1", "1_0.dcm");
+    loader.addTagFile("1.2", file);
+    TagMap* const image = file->findImage("1");
+    image->putAndInsertValue(kFilePath, VrCode::UT, "/a/1.2/1_0.dcm");
+    for (const char* asked : {"/a/1.2/1_0.dcm", "/b/1.2/1_0.dcm", "/b/1.2/1_.dcm", "/b/1.2/1_0.dcm"}) {
+        EXPECT_EQ(nameIn(loader.loadMetaData(asked)), "of^cache");
+        EXPECT_EQ(filePathOf(*image), asked);
+        EXPECT_EQ(image->findElement(kFilePath)->vr(), VrCode::LO);
+    }
 }
 
 TEST_F(LoaderTest, AMissingTagFileIsLookedForOnce)

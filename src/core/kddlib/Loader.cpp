@@ -6,6 +6,7 @@
 #include "kddlib/net/DicomFileReader.h"
 #include "kddlib/tagfile/TagFile.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
+#include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/Volume.h"
 #include "kddlib/volumes/VolumeFileName.h"
@@ -15,6 +16,7 @@
 
 #include <dcmtk/dcmdata/dcfilefo.h>
 
+#include <algorithm>
 #include <new>
 
 namespace Kdd
@@ -77,6 +79,14 @@ QByteArray baseName(const QByteArray& path)
     return path.mid(qMax(path.lastIndexOf('/'), path.lastIndexOf('\\')) + 1);
 }
 
+bool hasFilePath(const TagMap& image, const char* path)
+{
+    const TagElement* held = image.tagsForLevel().value(kFilePath, nullptr);
+    const uint length = qstrlen(path);
+    return held != nullptr && held->vr() == VrCode::LO && static_cast<uint>(held->value().size()) == length &&
+           std::equal(path, path + length, held->value().constData());
+}
+
 }  // namespace
 
 Loader::Loader() = default;
@@ -112,21 +122,23 @@ TagFile& Loader::tagFileForStudy(const QByteArray& studyUID)
 
 std::shared_ptr<Item> Loader::loadMetaData(const char* path)
 {
-    QByteArray sopUID;
-    QByteArray studyUID;
-    return extractUIDs(path, sopUID, studyUID) ? loadMetaData(path, sopUID, studyUID)
-                                               : loadDcmDataset(path, -1);
+    return extractUIDs(path, mSopUID, mStudyUID) ? loadMetaData(path, mSopUID, mStudyUID)
+                                                 : loadDcmDataset(path, -1);
 }
 
 std::shared_ptr<Item> Loader::loadMetaData(const char* path, const QByteArray& sopUID,
                                            const QByteArray& studyUID)
 {
+    Kdd::extractSuffix(path, mSuffix);
     std::shared_ptr<Item> item =
-        studyUID.isEmpty() ? nullptr : tagFileForStudy(studyUID).findImageEx(sopUID, extractSuffix(path));
+        studyUID.isEmpty() ? nullptr : tagFileForStudy(studyUID).findImageEx(sopUID, mSuffix);
     if (item == nullptr)
         return loadDcmDataset(path, -1);
-    // Under this path the file is known to whoever asks, wherever it lay when the tag file was built.
-    static_cast<ItemTM&>(*item).tagMap().putAndInsertValue(kFilePath, VrCode::LO, path);
+    // Under this path the file is known to whoever asks, wherever it lay when the tag file was built. Nearly always it
+    // is the one it was asked for by before, and looking costs less than storing it anew.
+    TagMap& image = static_cast<ItemTM&>(*item).tagMap();
+    if (!hasFilePath(image, path))
+        image.putAndInsertValue(kFilePath, VrCode::LO, path);
     return item;
 }
 

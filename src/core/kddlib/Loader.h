@@ -59,6 +59,11 @@ protected:
 
 private:
     QMap<QByteArray, std::shared_ptr<TagFile>> mTagFiles;
+
+    // What the path of a request names. Kept for the memory only, which the next request uses again.
+    QByteArray mSopUID;
+    QByteArray mStudyUID;
+    QByteArray mSuffix;
 };
 
 }  // namespace Kdd

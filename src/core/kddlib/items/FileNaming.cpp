@@ -1,51 +1,88 @@
 #include "kddlib/items/FileNaming.h"
 
+#include <cstring>
+#include <string_view>
+
 namespace Kdd
 {
 
 namespace
 {
 
-const char kExtension[] = ".dcm";
-constexpr int kExtensionLength = 4;
+constexpr std::string_view kExtension = ".dcm";
+constexpr std::size_t kShortestPath = 6;
 
-/// The last separator of folders at or before `from`; -1 when there is none.
-int lastSeparator(const QByteArray& path, int from)
+/// The path without its extension; false when it has another one.
+bool removeExtension(const char* path, std::string_view& rest)
 {
-    for (int i = from; i >= 0; --i) {
-        if (path.at(i) == '/' || path.at(i) == '\\')
-            return i;
-    }
-    return -1;
+    rest = path != nullptr ? path : "";
+    if (rest.size() < kShortestPath || rest.substr(rest.size() - kExtension.size()) != kExtension)
+        return false;
+    rest.remove_suffix(kExtension.size());
+    return true;
+}
+
+bool isSeparator(char character)
+{
+    return character == '/' || character == '\\';
+}
+
+/// What stands behind the last separator of folders.
+std::string_view lastName(std::string_view path)
+{
+    std::size_t start = path.size();
+    while (start > 0 && !isSeparator(path[start - 1]))
+        --start;
+    return path.substr(start);
+}
+
+/// Into the memory that `to` has got already.
+void assign(QByteArray& to, std::string_view from)
+{
+    to.resize(static_cast<int>(from.size()));
+    std::memcpy(to.data(), from.data(), from.size());
 }
 
 }  // namespace
 
 bool extractUIDs(const char* path, QByteArray& sopUID, QByteArray& studyUID)
 {
+    std::string_view rest;
+    if (removeExtension(path, rest)) {
+        const std::size_t underscore = rest.rfind('_');
+        rest = rest.substr(0, underscore != std::string_view::npos ? underscore : 0);
+        const std::string_view name = lastName(rest);
+        rest.remove_suffix(name.size());
+        if (rest.size() > 1) {
+            rest.remove_suffix(1);
+            assign(sopUID, name);
+            assign(studyUID, lastName(rest));
+            return true;
+        }
+    }
     sopUID.clear();
     studyUID.clear();
-    const QByteArray text(path);
-    if (text.size() < 6 || !text.endsWith(kExtension))
-        return false;
-    const int underscore = qMax(0, text.lastIndexOf('_', text.size() - kExtensionLength - 1));
-    const int nameSeparator = qMax(0, lastSeparator(text, underscore - 1));
-    if (nameSeparator < 1)
-        return false;
-    const int folderSeparator = lastSeparator(text, nameSeparator - 1);
-    sopUID = text.mid(nameSeparator + 1, underscore - nameSeparator - 1);
-    studyUID = text.mid(folderSeparator + 1, nameSeparator - folderSeparator - 1);
-    return true;
+    return false;
+}
+
+void extractSuffix(const char* path, QByteArray& suffix)
+{
+    std::string_view rest;
+    if (!removeExtension(path, rest)) {
+        suffix.clear();
+        return;
+    }
+    std::size_t start = rest.size();
+    while (start > 0 && rest[start - 1] != '_' && !isSeparator(rest[start - 1]))
+        --start;
+    assign(suffix, rest.substr(start));
 }
 
 QByteArray extractSuffix(const char* path)
 {
-    const QByteArray text(path);
-    if (text.size() <= 5 || !text.endsWith(kExtension))
-        return {};
-    const QByteArray name = text.mid(lastSeparator(text, text.size() - 1) + 1);
-    const QByteArray stem = name.left(name.size() - kExtensionLength);
-    return stem.mid(stem.lastIndexOf('_') + 1);
+    QByteArray suffix;
+    extractSuffix(path, suffix);
+    return suffix;
 }
 
 }  // namespace Kdd

@@ -67,7 +67,7 @@ TagMap* TagFile::addTagMap(TagMap* map, const char* path, bool replace)
         key = path;
     if (key.isEmpty() || (!mStudies.isEmpty() && mStudies.firstKey() != studyUID))
         return nullptr;
-    if (TagMap* old = mImages.value(key, nullptr)) {
+    if (TagMap* old = mImages.find(key)) {
         if (!replace)
             return nullptr;
         replaceImage(old);
@@ -127,7 +127,7 @@ TagMap* TagFile::findSeries(const QByteArray& seriesUID) const
 
 TagMap* TagFile::findImage(const QByteArray& sopUID) const
 {
-    return mImages.value(sopUID, nullptr);
+    return mImages.find(sopUID);
 }
 
 TagMap* TagFile::findImage(const QByteArray& sopUID, const QByteArray& suffix) const
@@ -157,7 +157,7 @@ int TagFile::removeImages(int count, const char** sopUIDs)
         TagMap* series = image != nullptr ? image->parent() : nullptr;
         if (series == nullptr)
             continue;
-        mImages.remove(sopUIDs[i]);
+        mImages.take(sopUIDs[i]);
         delete image;
         ++removed;
         TagMap* study = series->parent();
@@ -177,7 +177,7 @@ int TagFile::removeSeries(int count, const char** seriesUIDs)
         if (series == nullptr)
             continue;
         for (const TagMap* image : series->children())
-            mImages.remove(imageKey(*image));
+            mImages.take(imageKey(*image));
         TagMap* study = series->parent();
         dropSeries(series);
         ++removed;
@@ -198,7 +198,7 @@ void TagFile::removeImagesWithoutFilename(TagMap* series)
 
 void TagFile::dropImage(TagMap* image)
 {
-    mImages.remove(imageKey(*image));
+    mImages.take(imageKey(*image));
     delete image;
 }
 
@@ -249,7 +249,7 @@ void TagFile::optimizeAll()
 void TagFile::clear()
 {
     mSeries.clear();
-    mImages.clear();
+    mImages = {};
     mStudies.clear();
     // The times of reading and writing tell of the file, not of what is held.
     Statistics cleared;
@@ -272,7 +272,7 @@ TagFile::Statistics TagFile::statistics() const
 {
     Statistics statistics = mStatistics;
     statistics.series = mSeries.size();
-    statistics.images = mImages.size();
+    statistics.images = mImages.inOrder().size();
     return statistics;
 }
 

@@ -5,6 +5,7 @@
 
 #include <QByteArray>
 #include <QFile>
+#include <QHash>
 #include <QList>
 #include <QMap>
 #include <QString>
@@ -128,7 +129,7 @@ public:
     std::shared_ptr<TagMap> study() const;
 
     const QMap<QByteArray, TagMap*>& seriesByUID() const { return mSeries; }
-    const QMap<QByteArray, TagMap*>& imagesByUID() const { return mImages; }
+    const QMap<QByteArray, TagMap*>& imagesByUID() const { return mImages.inOrder(); }
 
     /// Counts of the present tree, and times [ms] and sizes [bytes] of its last optimisation, reading and writing.
     struct Statistics
@@ -245,11 +246,36 @@ private:
     using StudyIndex = QMap<QByteArray, std::shared_ptr<TagMap>>;
     using NodeIndex = QMap<QByteArray, TagMap*>;
 
+    /// Images in the order of their UIDs for whoever walks through all of them, and hashed for requests: among UIDs
+    /// that differ in their last digits only, the search in order is the largest part of a request.
+    class ImageIndex
+    {
+    public:
+        TagMap* find(const QByteArray& uid) const { return mHashed.value(uid, nullptr); }
+        const NodeIndex& inOrder() const { return mInOrder; }
+
+        void insert(const QByteArray& uid, TagMap* image)
+        {
+            mInOrder.insert(uid, image);
+            mHashed.insert(uid, image);
+        }
+
+        TagMap* take(const QByteArray& uid)
+        {
+            mHashed.remove(uid);
+            return mInOrder.take(uid);
+        }
+
+    private:
+        NodeIndex mInOrder;
+        QHash<QByteArray, TagMap*> mHashed;
+    };
+
     struct Indexes
     {
         StudyIndex studies;
         NodeIndex series;
-        NodeIndex images;
+        ImageIndex images;
     };
 
     class BodyReader;
@@ -290,7 +316,7 @@ private:
 
     StudyIndex mStudies;
     NodeIndex mSeries;
-    NodeIndex mImages;
+    ImageIndex mImages;
     QFile mCacheFile;
     QString mCacheFilePath;
     QString mFailure;

@@ -264,7 +264,7 @@ private:
         TagMap* image = readBelow(record, mSeries);
         const QByteArray key = imageKey(*image);
         // No file of ours holds an image twice; in a hostile one each would be searched for among its siblings.
-        TagMap* replaced = mFile.mImages.value(key, nullptr);
+        TagMap* replaced = mFile.mImages.find(key);
         if (replaced != nullptr && ++mReplacedImages > kMaxReplacedImages)
             return false;
         delete replaced;

@@ -10,8 +10,8 @@ std::shared_ptr<Item> TagFile::findImageEx(const QByteArray& sopUID, const QByte
     TagMap* image = findImage(sopUID, suffix);
     if (image == nullptr)
         return nullptr;
-    const std::shared_ptr<TagMap> study = mStudies.value(image->uid(TagMap::StudyLevel));
-    return study != nullptr ? std::make_shared<ItemTM>(*image, study) : nullptr;
+    const auto study = mStudies.constFind(image->uid(TagMap::StudyLevel));
+    return study != mStudies.cend() ? std::make_shared<ItemTM>(*image, *study) : nullptr;
 }
 
 }  // namespace Kdd

@@ -10,6 +10,7 @@
 #include <QFileInfo>
 
 #include <algorithm>
+#include <utility>
 
 namespace Kdd
 {
@@ -151,7 +152,7 @@ void TagFile::swapIndexes(Indexes& indexes)
 {
     mStudies.swap(indexes.studies);
     mSeries.swap(indexes.series);
-    mImages.swap(indexes.images);
+    std::swap(mImages, indexes.images);
 }
 
 bool TagFile::failMerge(const QString& reason)
