@@ -4,6 +4,9 @@
 #include "kddlib/items/kdditemof.h"
 #include "kddlib/items/kdditemtm.h"
 #include "kddlib/net/DicomFileReader.h"
+#include "kddlib/net/KxCurlClient.h"
+#include "kddlib/net/KxCurlDownloadStream.h"
+#include "kddlib/net/KxDcmFileLoader.h"
 #include "kddlib/tagfile/TagFile.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
@@ -33,31 +36,45 @@ std::shared_ptr<Item> itemOf(DcmFileFormat& file)
 std::shared_ptr<Item> loadWholeFile(const char* path)
 {
     DcmFileFormat file;
-    const OFCondition condition = readDicomFile(path, file);
+    const OFCondition condition = loadDicomFile(path, file);
     if (condition.good())
         return itemOf(file);
     LogFile::errorf("Could not load %s: %s", path, condition.text());
     return nullptr;
 }
 
+/// How many of the first bytes of an object there are; -1 when it cannot be had. No range is asked for, because not
+/// every server knows them; what is on its way beyond is broken off.
+qint64 readFirstOfObject(const char* url, QByteArray& bytes)
+try {
+    KxCurlDownloadStream stream = KxCurlClient::instance().read(url, false);
+    return stream.httpStatus().code / 100 == 2 ? stream.read(bytes.data(), bytes.size()).gcount() : -1;
+} catch (const std::exception&) {
+    return -1;
+}
+
+qint64 readFirst(const char* path, QByteArray& bytes)
+{
+    if (KxCurlClient::isUrl(path))
+        return readFirstOfObject(path, bytes);
+    RandomAccessFile file;
+    return file.open(path) == 0 ? qMax<qint64>(0, file.readAt(0, bytes.data(), bytes.size())) : -1;
+}
+
 /// The first bytes of a file; false, with the reason logged, when there are not so many.
 bool readBeginning(const char* path, int size, QByteArray& bytes)
 {
-    RandomAccessFile file;
     try {
         bytes.resize(size);
     } catch (const std::bad_alloc&) {
         LogFile::errorf("%s: Could not allocate %lld bytes.", path, static_cast<long long>(size));
         return false;
     }
-    if (file.open(path) != 0) {
+    const qint64 count = readFirst(path, bytes);
+    if (count < 0)
         LogFile::errorf("Could not open %s", path);
-        return false;
-    }
-    const qint64 count = file.readAt(0, bytes.data(), size);
-    if (count != size)
-        LogFile::errorf("%s: Could only read %d of %d bytes", path, static_cast<int>(qMax<qint64>(0, count)),
-                        size);
+    else if (count != size)
+        LogFile::errorf("%s: Could only read %d of %d bytes", path, static_cast<int>(count), size);
     return count == size;
 }
 

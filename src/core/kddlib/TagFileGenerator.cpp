@@ -1,8 +1,8 @@
 #include "kddlib/TagFileGenerator.h"
 
 #include "kddlib/Limits.h"
-#include "kddlib/net/DicomFileReader.h"
 #include "kddlib/net/KxCurlClient.h"
+#include "kddlib/net/KxDcmFileLoader.h"
 #include "kddlib/net/KxHttpStatus.h"
 #include "kddlib/previews/PreviewGenerator.h"
 #include "kddlib/previews/QuadrantNavigation.h"
@@ -221,7 +221,7 @@ void TagFileGenerator::addDicomFile(TagFile& tagFile, const std::string& path, c
 {
     const StopwatchSum::Running running(mLoadWatch);
     DcmFileFormat file;
-    const OFCondition condition = readDicomFile(path.c_str(), file);
+    const OFCondition condition = loadDicomFile(path.c_str(), file);
     if (condition.bad()) {
         LogFile::errorf("Could not open %s: %s", path.c_str(), condition.text());
         return;
@@ -265,7 +265,7 @@ void TagFileGenerator::addPreviews(TagFile& tagFile, const QList<QByteArray>& ch
         const QByteArray path = filePathOf(*image);
         DcmFileFormat reloaded;
         DcmDataset* dataset = datasets.find(sopUID);
-        if (dataset == nullptr && readDicomFile(path.constData(), reloaded).good())
+        if (dataset == nullptr && loadDicomFile(path.constData(), reloaded).good())
             dataset = reloaded.getDataset();
         tagFile.addPreview(image, dataset, QString::fromLocal8Bit(path));
     }

@@ -1,6 +1,6 @@
 #include "kddlib/items/kdditemtm.h"
 
-#include "kddlib/net/DicomFileReader.h"
+#include "kddlib/net/KxDcmFileLoader.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/tagmodel/TagSequence.h"
@@ -38,7 +38,7 @@ int transferSyntaxNumber(const TagMap& map)
 std::shared_ptr<DcmDataset> loadDataset(const QByteArray& path, OFCondition& condition)
 {
     DcmFileFormat file;
-    condition = readDicomFile(path.constData(), file);
+    condition = loadDicomFile(path.constData(), file);
     return std::shared_ptr<DcmDataset>(condition.good() ? file.getAndRemoveDataset() : nullptr);
 }
 

@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <charconv>
+#include <limits>
 
 namespace Kdd
 {
@@ -33,6 +34,9 @@ std::optional<ContentRange> ContentRange::parse(std::string_view value)
     const bool isOpen = totalText == "*";
     const auto total = isOpen ? std::optional<qint64>(-1) : parseByteCount(totalText);
     if (!first || !last || !total || *first > *last || (!isOpen && *last >= *total))
+        return std::nullopt;
+    // Of an object without a known length: one more byte must still be a number.
+    if (*last == std::numeric_limits<qint64>::max())
         return std::nullopt;
     return ContentRange{{*first, *last}, *total};
 }

@@ -27,7 +27,7 @@ struct ContentRange
     ByteRange range;
     qint64 total = -1;  // of the whole object [bytes]; -1: the server does not say, "*"
 
-    /// Nothing unless the value is of that form, first <= last < total, and each number below 2^63.
+    /// Nothing unless the value is of that form, first <= last < total, and each number below 2^63, `last` by one more.
     static std::optional<ContentRange> parse(std::string_view value);
 };
 

@@ -37,6 +37,18 @@ std::string_view valueAfter(std::string_view line, std::size_t colon)
 
 }  // namespace
 
+std::optional<HeaderLine> HeaderLine::parse(std::string_view line)
+{
+    constexpr std::size_t kLineEnd = 2;
+    if (line.size() <= kLineEnd || line.substr(line.size() - kLineEnd) != "\r\n")
+        return std::nullopt;
+    line.remove_suffix(kLineEnd);
+    const std::size_t colon = line.find(':');
+    const bool hasValue = colon != std::string_view::npos;
+    return HeaderLine{lowerCase(line.substr(0, colon)),
+                      hasValue ? valueAfter(line, colon) : std::string_view()};
+}
+
 void HeaderReceiver::attach(CURL* easy)
 {
     mEasy = easy;
@@ -58,14 +70,8 @@ void HeaderReceiver::takeLine(std::string_view line)
     mStarted = true;
     takeCode();
 
-    constexpr std::size_t kLineEnd = 2;
-    if (line.size() <= kLineEnd || line.substr(line.size() - kLineEnd) != "\r\n")
-        return;
-    line.remove_suffix(kLineEnd);
-    const std::size_t colon = line.find(':');
-    const bool hasValue = colon != std::string_view::npos;
-    std::string& value = mStatus.headers[lowerCase(line.substr(0, colon))];
-    value = hasValue ? valueAfter(line, colon) : std::string_view();
+    if (const auto header = HeaderLine::parse(line))
+        mStatus.headers[header->name] = header->value;
 }
 
 /// Not only on the first line: below 200 the answer is still to come.

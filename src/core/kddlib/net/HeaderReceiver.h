@@ -6,6 +6,8 @@
 
 #include <cstddef>
 #include <exception>
+#include <optional>
+#include <string>
 #include <string_view>
 
 namespace Kdd
@@ -39,6 +41,17 @@ public:
 
 private:
     std::exception_ptr mFault;
+};
+
+/// A header of a response.
+struct HeaderLine
+{
+    std::string name;        // in lower case
+    std::string_view value;  // part of the line it was parsed from
+
+    /// A line with its line end; one without a colon is a name with an empty value. Nothing when the line end is
+    /// missing or there is nothing before it.
+    static std::optional<HeaderLine> parse(std::string_view line);
 };
 
 /// Takes the header lines of one response into a status, for every kind of request. Time is counted from its making. Curl

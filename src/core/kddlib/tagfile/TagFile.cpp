@@ -2,7 +2,7 @@
 
 #include "kddlib/Limits.h"
 #include "kddlib/items/FileNaming.h"
-#include "kddlib/net/DicomFileReader.h"
+#include "kddlib/net/KxDcmFileLoader.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
@@ -112,7 +112,7 @@ TagMap* TagFile::addDataset(DcmDataset* dataset, const char* path, bool replace)
 TagMap* TagFile::addDicomFile(const char* file, const char* path, bool replace)
 {
     DcmFileFormat format;
-    const OFCondition condition = readDicomFile(file, format);
+    const OFCondition condition = loadDicomFile(file, format);
     if (condition.bad()) {
         LogFile::errorf("Could not load %s: %s", file, condition.text());
         return nullptr;

@@ -1,4 +1,4 @@
-#include "kddlib/net/DicomFileReader.h"
+#include "kddlib/net/KxDcmFileLoader.h"
 #include "kddlib/previews/PreviewGenerator.h"
 #include "kddlib/previews/QuadrantNavigation.h"
 #include "kddlib/tagfile/TagFile.h"
@@ -215,7 +215,7 @@ bool TagFile::addPreview(const QByteArray& sopInstanceUID, const QString& path)
     if (image == nullptr)
         return false;
     DcmFileFormat file;
-    const OFCondition condition = readDicomFile(QFile::encodeName(path).constData(), file);
+    const OFCondition condition = loadDicomFile(QFile::encodeName(path).constData(), file);
     if (condition.bad()) {
         LogFile::warnf(kNotCreated, qUtf8Printable(path), condition.text());
         return false;

@@ -1,0 +1,214 @@
+#include "kddlib/Loader.h"
+#include "kddlib/items/kdditem.h"
+#include "kddlib/net/DcmInputHttpStream.h"
+#include "kddlib/net/KxCurlClient.h"
+#include "kddlib/net/KxDcmFileLoader.h"
+#include "support/DatasetBuilder.h"
+#include "support/HttpServer.h"
+#include "support/LogCapture.h"
+#include "support/RealFiles.h"
+
+#include <QFile>
+#include <QTemporaryDir>
+
+#include <dcmtk/config/osconfig.h>
+
+#include <dcmtk/dcmdata/dctk.h>
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <sstream>
+
+using namespace Kdd;
+using testing::HasSubstr;
+using Mode = KxDcmFileLoader::Mode;
+
+namespace
+{
+
+QByteArray contentOf(const QString& path)
+{
+    QFile file(path);
+    return file.open(QIODevice::ReadOnly) ? file.readAll() : QByteArray();
+}
+
+/// All attributes with all their values; or just why not all could be read.
+std::string textOf(KxDcmFileLoader& loader, const OFCondition& condition)
+{
+    std::ostringstream text;
+    text << condition.text() << '\n';
+    if (condition.good())
+        loader.getDataset()->print(text, DCMTypes::PF_shortenLongTagValues);
+    return text.str();
+}
+
+std::string load(const std::string& name, Mode mode)
+{
+    KxDcmFileLoader loader(mode);
+    return textOf(loader, loader.loadFile(name.c_str(), EXS_Unknown, EGL_noChange, 4096));
+}
+
+/// An image with a value that is longer than any window, in a file that comes with the preamble.
+class DicomUrl : public testing::Test
+{
+protected:
+    DicomUrl()
+    {
+        DcmFileFormat format(&image.dataset());
+        format.saveFile(path().c_str(), EXS_LittleEndianExplicit);
+        bytes = contentOf(folder.filePath(QStringLiteral("a.dcm")));
+    }
+    ~DicomUrl() override
+    {
+        KxDcmFileLoader::setDefaultMode(Mode::WholeLocal);
+        KxDcmFileLoader::setDefaultPort(nullptr);
+        KxDcmFileLoader::setBearerToken(nullptr);
+    }
+
+    std::string path() const { return folder.filePath(QStringLiteral("a.dcm")).toStdString(); }
+
+    static QByteArray withLength(const QByteArray& body, int missing = 0)
+    {
+        return "HTTP/1.1 200 OK\r\nContent-Length: " + QByteArray::number(body.size()) + "\r\n\r\n" +
+               body.chopped(missing);
+    }
+
+    /// The port of a server, as the storage servers have it.
+    static std::string portOf(const ScriptedServer& server)
+    {
+        const std::string url = server.url("");
+        return url.substr(url.rfind(':') + 1, url.rfind('/') - url.rfind(':') - 1);
+    }
+
+    QTemporaryDir folder;
+    DatasetBuilder image =
+        anImage("1").with(DCM_PatientName, "Doe^J").with(DCM_TextValue, std::string(300'000, 't').c_str());
+    QByteArray bytes;
+};
+
+TEST_F(DicomUrl, ReadsTheSameFromAPathAUrlAndAStorageServer)
+{
+    const ScriptedServer server(
+        [this](const QByteArray&) -> ScriptedServer::Reply { return {withLength(bytes)}; });
+    KxDcmFileLoader::setDefaultPort(portOf(server).c_str());
+    KxDcmFileLoader::setBearerToken("secret");
+    const std::string expected = load(path(), Mode::WholeLocal);
+    EXPECT_THAT(expected, HasSubstr("Normal\n"));
+    EXPECT_THAT(load(path(), Mode::BoundedLocal), HasSubstr("(not loaded)"));
+    KxDcmFileLoader bounded(Mode::BoundedLocal);
+    const OFCondition condition = bounded.loadFile(path().c_str());
+    EXPECT_TRUE(bounded.readUntilEnd().good());
+    EXPECT_EQ(textOf(bounded, condition), expected);
+    EXPECT_EQ(load(path(), Mode::StorageServer), expected);  // which is no storage path
+    EXPECT_EQ(load(server.url("a.dcm"), Mode::BoundedLocal), expected);
+    EXPECT_THAT(server.requests().back().toStdString(), Not(HasSubstr("secret")));
+    EXPECT_EQ(load("\\\\127.0.0.1\\share\\a.dcm", Mode::StorageServer), expected);
+    EXPECT_THAT(server.requests().back().toStdString(), HasSubstr("GET /share/a.dcm "));
+    EXPECT_THAT(server.requests().back().toStdString(), HasSubstr("\r\nAuthorization: Bearer secret\r\n"));
+}
+
+TEST_F(DicomUrl, NeedsNoLengthFromTheServer)
+{
+    const ScriptedServer server(
+        [this](const QByteArray&) -> ScriptedServer::Reply { return {"HTTP/1.1 200 OK\r\n\r\n" + bytes}; });
+    EXPECT_EQ(load(server.url("a.dcm"), Mode::Default), load(path(), Mode::Default));
+}
+
+TEST_F(DicomUrl, FailsWhereverTheTransferBreaksOff)
+{
+    const std::string whole = load(path(), Mode::Default);
+    int missing = 0;
+    const ScriptedServer server(
+        [&](const QByteArray&) -> ScriptedServer::Reply { return {withLength(bytes, missing)}; });
+    for (const int present : {0, 1, 131, 200, 340, 1000, 100'000, bytes.size() - 1}) {
+        missing = bytes.size() - present;
+        EXPECT_THAT(load(server.url("a.dcm"), Mode::Default), Not(HasSubstr("Normal\n"))) << present;
+    }
+    missing = 0;
+    EXPECT_EQ(load(server.url("a.dcm"), Mode::Default), whole);
+}
+
+TEST_F(DicomUrl, TellsOfARefusalOnce)
+{
+    const LogCapture log;
+    const ScriptedServer server([](const QByteArray&) -> ScriptedServer::Reply {
+        return {"HTTP/1.1 403 Forbidden\r\nContent-Length: 2\r\n\r\nno"};
+    });
+    KxDcmFileLoader loader;
+    EXPECT_EQ(loader.loadFile(server.url("a").c_str()), EC_InvalidStream);
+    EXPECT_EQ(log.count("Reading " + server.url("a") + " failed: HTTP response code 403"), 1);
+    EXPECT_EQ(KxDcmFileLoader(Mode::StorageServer).loadFile("//127.0.0.1/a/b"), EC_InvalidStream);
+    DcmInputHttpStream unasked;
+    EXPECT_STREQ(unasked.status().text(), "Logical error on IO operation");
+}
+
+TEST_F(DicomUrl, ALoaderTakesUrlsForPaths)
+{
+    const NginxServer server;
+    server.addFile("1.2_0.dcm", bytes);
+    OFString name;
+    for (const int size : {-1, bytes.size()}) {
+        const std::shared_ptr<Item> item = Loader::loadDcmDataset(server.url("1.2_0.dcm").c_str(), size);
+        ASSERT_NE(item, nullptr) << size;
+        EXPECT_TRUE(item->findAndGetOFString(DCM_PatientName, name).good());
+        EXPECT_EQ(name, "Doe^J");
+    }
+    EXPECT_EQ(Loader::loadDcmDataset(server.url("absent.dcm").c_str(), -1), nullptr);
+    EXPECT_EQ(Loader::loadDcmDataset(server.url("1.2_0.dcm").c_str(), bytes.size() + 1), nullptr);
+}
+
+TEST(StoragePaths, BecomeUrls)
+{
+    const std::pair<const char*, const char*> paths[] = {
+        {"\\\\filer\\share\\a\\b.dcm", "http://filer:90/share/a/b.dcm"},
+        {"/Storage/filer/share/b.dcm", "http://filer:90/share/b.dcm"},
+        {"\\Storage\\filer/x", "http://filer:90/x"},
+        {"/Storage/filer", ""},
+        {"//filer", ""},
+        {"/data/a.dcm", ""},
+        {"///a", ""},
+        {"", ""},
+    };
+    for (const auto& [path, expected] : paths) {
+        std::string url = path;
+        EXPECT_EQ(KxDcmFileLoader::convertPathToURL(url, "90"), *expected != 0) << path;
+        EXPECT_EQ(url, *expected ? expected : path);
+    }
+    EXPECT_EQ(KxDcmFileLoader::convertPathToExternalURL("//filer/a/b"), KxCurlClient::url("a/b"));
+    EXPECT_EQ(KxDcmFileLoader::convertPathToExternalURL("/data/a"), "");
+}
+
+TEST(StoragePaths, LeadToTheUsualPortUnlessOneIsSet)
+{
+    const LogCapture log;
+    std::string url = "//filer/a";
+    EXPECT_TRUE(KxDcmFileLoader::convertPathToURL(url, ""));
+    EXPECT_EQ(url, "http://filer:8181/a");
+    EXPECT_EQ(KxDcmFileLoader::defaultPort(), "8181");
+    EXPECT_EQ(log.count("ZPC parameter FFS2/Port is empty, using 8181 instead."), 1);
+    EXPECT_EQ(KxDcmFileLoader::setDefaultMode(Mode::StorageServer), Mode::WholeLocal);
+    EXPECT_EQ(KxDcmFileLoader::setDefaultMode(Mode::WholeLocal), Mode::StorageServer);
+    KxDcmFileLoader::setDefaultPort(nullptr);
+}
+
+TEST(RealFilesByUrl, AreReadAsFromTheirPaths)
+{
+    if (realFilesFolder().isEmpty())
+        GTEST_SKIP() << "KDD_TEST_DATA is not set";
+    QByteArray content;
+    const ScriptedServer server([&](const QByteArray&) -> ScriptedServer::Reply {
+        return {"HTTP/1.1 200 OK\r\nContent-Length: " + QByteArray::number(content.size()) + "\r\n\r\n" +
+                content};
+    });
+    for (const char* subfolder : {"transfer-syntaxes", "modalities", "odd"}) {
+        for (const QString& path : realFiles(subfolder)) {
+            content = contentOf(path);
+            if (content.size() > 20'000'000)
+                continue;
+            EXPECT_EQ(load(server.url("x"), Mode::Default), load(path.toStdString(), Mode::Default))
+                << path.toStdString();
+        }
+    }
+}
+
+}  // namespace
