@@ -14,7 +14,7 @@ namespace
 
 constexpr int kSocketBuffer = 256 * 1024;  // [bytes]
 constexpr long kLowSpeed = 1;              // [bytes per second]
-constexpr long kLowSpeedTime = 120;        // [s]
+constexpr long kLowSpeedTime = 120;        // [s], also the longest time to connect
 
 int prepareSocket(void* /*data*/, curl_socket_t socket, curlsocktype purpose)
 {
@@ -52,6 +52,7 @@ void CurlOptions::setTransport(const std::string& url, const CurlShare& share,
     set(CURLOPT_SOCKOPTFUNCTION, &prepareSocket);
     set(CURLOPT_LOW_SPEED_LIMIT, kLowSpeed);
     set(CURLOPT_LOW_SPEED_TIME, kLowSpeedTime);
+    set(CURLOPT_CONNECTTIMEOUT, kLowSpeedTime);
 }
 
 void HeaderLines::add(const std::string& line)
