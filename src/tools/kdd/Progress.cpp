@@ -38,11 +38,13 @@ QString Progress::countText(double count) const
 void Progress::show(qint64 done, qint64 total)
 {
     const Clock::time_point now = Clock::now();
+    if (mFirst < 0)
+        mFirst = done;
     if (!mIsDrawn || (now - mLast < kRedrawAfter && done != total))
         return;
     mLast = now;
     const double seconds = std::chrono::duration<double>(now - mStart).count();
-    const double rate = seconds > 0 ? static_cast<double>(done) / seconds : 0;
+    const double rate = seconds > 0 ? static_cast<double>(done - mFirst) / seconds : 0;
     const QString rateText = countText(rate) + QStringLiteral("/s");
     const QString doneText = countText(static_cast<double>(done));
     if (total <= 0) {

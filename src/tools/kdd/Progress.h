@@ -32,6 +32,7 @@ private:
     Unit mUnit;
     Clock::time_point mStart = Clock::now();
     Clock::time_point mLast;
+    qint64 mFirst = -1;  // what was there before, which says nothing of the rate
 };
 
 }  // namespace Kdd
