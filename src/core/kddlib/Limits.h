@@ -30,6 +30,9 @@ constexpr int kMaxVolumeImages = 1000 * 1000;
 /// The body of an HTTP response that is read into memory as a whole [bytes].
 constexpr qint64 kMaxResponseSize = qint64(1024) * 1024 * 1024;
 
+/// The file with a service account's key [bytes].
+constexpr qint64 kMaxServiceAccountFile = qint64(64) * 1024;
+
 /// Values up to this length are kept, longer ones are only known to exist [bytes].
 constexpr unsigned int kDefaultValueBound = 1024;
 

@@ -94,6 +94,7 @@ Outcome runDiff(const GlobalOptions& options, const QString& left, const QString
 Outcome runVerify(const GlobalOptions& options, const StudySelection& selection);
 Outcome runDelete(const GlobalOptions& options, const NodeSelection& selection);
 Outcome runGet(const GlobalOptions& options, const GetRequest& request);
+Outcome runPut(const GlobalOptions& options, const QString& path, const QByteArray& url);
 Outcome runSample(const GlobalOptions& options, const SampleRequest& request);
 
 }  // namespace Kdd

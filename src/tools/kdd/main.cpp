@@ -258,6 +258,10 @@ private:
         get.add_option("URL", mUrl, "http://, https:// or gs://")->required();
         get.add_option("-o,--output", mFile, "File or folder to write to (default: the URL's own name)");
         get.add_option("--parallel", mParallel, "Ranges fetched at a time")->check(CLI::Range(1, 64));
+        CLI::App& put = declare("put", "Upload a file to the cloud storage",
+                                [this] { return runPut(mGlobal, path(mFile), bytes(mUrl)); });
+        put.add_option("FILE", mFile, "What to upload")->required();
+        put.add_option("URL", mUrl, "gs://BUCKET/OBJECT")->required();
     }
 
     PreviewsRequest previewsRequest() const

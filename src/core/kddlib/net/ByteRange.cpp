@@ -6,6 +6,12 @@
 
 namespace Kdd
 {
+namespace
+{
+
+constexpr std::size_t kNowhere = std::string_view::npos;
+
+}  // namespace
 
 std::optional<qint64> parseByteCount(std::string_view digits)
 {
@@ -26,7 +32,7 @@ std::optional<ContentRange> ContentRange::parse(std::string_view value)
     constexpr std::string_view kUnit = "bytes ";
     const std::size_t dash = value.find('-');
     const std::size_t slash = value.find('/');
-    if (value.substr(0, kUnit.size()) != kUnit || dash == value.npos || slash == value.npos || dash > slash)
+    if (value.substr(0, kUnit.size()) != kUnit || dash == kNowhere || slash == kNowhere || dash > slash)
         return std::nullopt;
     const auto first = parseByteCount(value.substr(kUnit.size(), dash - kUnit.size()));
     const auto last = parseByteCount(value.substr(dash + 1, slash - dash - 1));
@@ -44,7 +50,7 @@ std::optional<ContentRange> ContentRange::parse(std::string_view value)
 WantedRange::WantedRange(std::string_view text)
 {
     const std::size_t dash = text.find('-');
-    if (dash == text.npos)
+    if (dash == kNowhere)
         return;
     const auto first = parseByteCount(text.substr(0, dash));
     const auto last = parseByteCount(text.substr(dash + 1));

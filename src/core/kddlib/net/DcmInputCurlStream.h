@@ -24,7 +24,7 @@ public:
     explicit DcmInputCurlStream(KxCurlDownloadStream&& stream);
 
     /// The parser never has to wait for a second call.
-    OFBool suspend() { return OFFalse; }
+    static OFBool suspend() { return OFFalse; }
 
     /// None: what has been read cannot be had again.
     DcmInputStreamFactory* newFactory() const override { return nullptr; }

@@ -33,7 +33,7 @@ public:
     void request(const char* url) { mProducer.request(url, mBearerToken); }
 
     /// As in DcmInputCurlStream.
-    OFBool suspend() { return OFFalse; }
+    static OFBool suspend() { return OFFalse; }
     DcmInputStreamFactory* newFactory() const override { return nullptr; }
 
     KxCurlDownloadStream& curlStream() { return mProducer.stream(); }

@@ -5,6 +5,9 @@
 #include "kddlib/net/KxCurlDownloadStream.h"
 #include "kddlib/net/KxCurlDownloadStreambuf.h"
 #include "kddlib/net/KxCurlRequest.h"
+#include "kddlib/net/KxCurlUploadStream.h"
+#include "kddlib/net/KxCurlUploadStreambuf.h"
+#include "kddlib/net/KxGoogleAuth.h"
 #include "kddlib/net/PreparedRequest.h"
 #include "kddlib/net/RequestAddress.h"
 #include "kddlib/net/TlsLocks.h"
@@ -15,6 +18,8 @@
 
 #include <algorithm>
 #include <mutex>
+#include <stdexcept>
+#include <thread>
 #include <utility>
 
 namespace Kdd
@@ -104,6 +109,7 @@ struct KxCurlClient::Private
 
     mutable std::mutex mutex;
     ClientSettings settings;
+    KxGoogleAuth googleAuthentication;
     CurlShare share{connectionsOfSite()};
     std::shared_ptr<KxCurlHandleFactory> handles = std::make_shared<KxCurlHandleFactory>(kIdleHandles);
 };
@@ -125,7 +131,9 @@ KxCurlDownloadStream KxCurlClient::Private::get(const std::string& url, std::vec
                                                 std::optional<ByteRange> firstRange) const
 {
     KxCurlDownloadRequest::Origin origin;
-    origin.prepared = prepareRequest(url, std::move(headers), RequestBody::None, currentSettings());
+    origin.prepare = [this, url, headers = std::move(headers)] {
+        return prepareRequest(url, headers, RequestBody::None, currentSettings());
+    };
     return open(std::move(origin), firstRange);
 }
 
@@ -133,6 +141,9 @@ KxCurlClient::KxCurlClient()
 {
     setUpCurl();
     mPrivate = new Private;
+    mPrivate->settings.authorization = [this] {
+        return mPrivate->googleAuthentication.authorizationHeader(*this).toStdString();
+    };
 }
 
 KxCurlClient& KxCurlClient::instance()
@@ -191,9 +202,9 @@ void KxCurlClient::setMaxConnects(int count)
     mPrivate->handles->setMaxConnects(count);
 }
 
-void KxCurlClient::setAuthorization(const Authorization& authorization)
+void KxCurlClient::setGoogleAuthentication(const QJsonObject& key)
 {
-    mPrivate->change(&ClientSettings::authorization, authorization);
+    mPrivate->googleAuthentication.loadCredentialsFromJson(key, "");
 }
 
 KxCurlDownloadStream KxCurlClient::read(const std::string& url, bool partial)
@@ -236,8 +247,10 @@ QJsonDocument KxCurlClient::postBytes(const std::string& url, const QByteArray& 
                                       const std::string& contentType, KxHttpStatus& status)
 {
     KxCurlDownloadRequest::Origin origin;
-    origin.prepared =
-        prepareRequest(url, {"Content-Type: " + contentType}, RequestBody::Sent, mPrivate->currentSettings());
+    origin.prepare = [&] {
+        return prepareRequest(url, {"Content-Type: " + contentType}, RequestBody::Sent,
+                              mPrivate->currentSettings());
+    };
     origin.body = body;
     origin.hasBody = RequestBody::Sent;
     KxCurlDownloadStream stream = mPrivate->open(std::move(origin), std::nullopt);
@@ -252,6 +265,19 @@ QJsonDocument KxCurlClient::postBytes(const std::string& url, const QByteArray& 
 QJsonDocument KxCurlClient::postJson(const std::string& url, const QJsonObject& object, KxHttpStatus& status)
 {
     return postBytes(url, QJsonDocument(object).toJson(), "application/json", status);
+}
+
+KxCurlUploadStream KxCurlClient::write(const std::string& url)
+{
+    if (!namesCloudObject(url))
+        throw std::invalid_argument(url + " names no object of the cloud storage");
+    UploadTarget target;
+    target.url = cloudUrl(url, CloudEndpoint::Upload);
+    target.authorization = authorizationHeader(mPrivate->currentSettings());
+    auto session = std::make_unique<KxCurlUploadSession>(
+        mPrivate->handles, mPrivate->share, std::move(target),
+        [](std::chrono::milliseconds delay) { std::this_thread::sleep_for(delay); });
+    return KxCurlUploadStream(std::make_unique<KxCurlUploadStreambuf>(std::move(session)));
 }
 
 bool KxCurlClient::deleteObject(const std::string& url)

@@ -4,7 +4,6 @@
 
 #include <QByteArray>
 
-#include <functional>
 #include <string>
 #include <vector>
 
@@ -15,6 +14,7 @@ namespace Kdd
 {
 
 class KxCurlDownloadStream;
+class KxCurlUploadStream;
 struct KxHttpStatus;
 
 /// The one way by which the library reads and writes over HTTP and HTTPS.
@@ -58,11 +58,10 @@ public:
     int maxConnects() const;
     void setMaxConnects(int count);
 
-    /// Who is asked for the header line "Authorization: ..." of each request to the cloud storage; an empty line means
-    /// that there is none, and the request goes out without. Called on the thread of the request. What it throws
-    /// passes to the caller of the request.
-    using Authorization = std::function<std::string()>;
-    void setAuthorization(const Authorization& authorization);
+    /// The service account's key, as JSON, by which requests to the cloud storage are authorised. Without one it comes
+    /// from the file that the environment variable GOOGLE_APPLICATION_CREDENTIALS names, when it is first needed;
+    /// requests go out unauthorised when there is none. A key that cannot be used is logged and changes nothing.
+    void setGoogleAuthentication(const QJsonObject& key);
 
     /// Opens an object and waits for the first of it. `partial`: as several ranges at a time, when the settings and the
     /// server have it so; else in one request. `headers` are lines of name, colon, blank, value; a range among them is
@@ -92,6 +91,11 @@ public:
 
     /// The same with the object, indented, as "application/json".
     QJsonDocument postJson(const std::string& url, const QJsonObject& object, KxHttpStatus& status);
+
+    /// Begins to write an object of the cloud storage. std::invalid_argument when the address names none;
+    /// UnrecoverableResponseError when the storage refuses; RetryPolicyExhaustedError when it cannot be reached, which
+    /// takes some 15 to 20 seconds.
+    KxCurlUploadStream write(const std::string& url);
 
     /// Deletes an object of the cloud storage: whether the storage says so. Any other address is left alone, and the
     /// answer is true. CurlError also when the transfer breaks off.

@@ -86,8 +86,9 @@ KxCurlDownloadRequest::~KxCurlDownloadRequest()
 void KxCurlDownloadRequest::setUp(const Origin& origin)
 {
     CurlOptions options(mEasy.get(), mErrorText);
-    options.setTransport(origin.prepared.url, *origin.share, mMulti->factory());
-    addHeaders(origin.prepared);
+    const PreparedRequest prepared = origin.prepare();
+    options.setTransport(prepared.url, *origin.share, mMulti->factory());
+    addHeaders(prepared);
     options.set(CURLOPT_HTTPHEADER, mHeaders.list());
     if (origin.hasBody == RequestBody::Sent) {
         options.set(CURLOPT_POST, 1L);

@@ -40,7 +40,9 @@ public:
     {
         std::shared_ptr<MultiMap> multi;
         const CurlShare* share = nullptr;
-        PreparedRequest prepared;
+
+        /// Asked for each request, because a long download outlives the token by which it is authorised.
+        std::function<PreparedRequest()> prepare;
         QByteArray body;
         RequestBody hasBody = RequestBody::None;
     };

@@ -30,6 +30,21 @@ QByteArray prefixOf(CloudEndpoint endpoint)
     return ExResource::cloudApiEndpoint();
 }
 
+struct CloudNames
+{
+    std::string_view bucket;  ///< with the "/" behind it, if there is one
+    std::string_view object;
+};
+
+CloudNames namesIn(std::string_view address)
+{
+    address.remove_prefix(kCloudScheme.size());
+    address.remove_prefix(std::min(address.find_first_not_of('/'), address.size()));
+    const std::size_t bucketEnd = address.find('/');
+    const std::size_t objectStart = bucketEnd == std::string_view::npos ? address.size() : bucketEnd + 1;
+    return {address.substr(0, objectStart), address.substr(objectStart)};
+}
+
 std::string escapedObject(std::string_view name)
 {
     std::string escaped;
@@ -71,16 +86,18 @@ bool isCloudAddress(const std::string& address)
     return startsWith(address, kCloudScheme);
 }
 
+bool namesCloudObject(const std::string& address)
+{
+    if (!isCloudAddress(address))
+        return false;
+    const auto [bucket, object] = namesIn(address);
+    return !bucket.empty() && !object.empty();
+}
+
 std::string cloudUrl(const std::string& address, CloudEndpoint endpoint)
 {
-    std::string_view name(address);
-    name.remove_prefix(kCloudScheme.size());
-    name.remove_prefix(std::min(name.find_first_not_of('/'), name.size()));
-    const std::size_t bucketEnd = name.find('/');
-    const std::size_t objectStart = bucketEnd == std::string_view::npos ? name.size() : bucketEnd + 1;
-    std::string url = prefixOf(endpoint).toStdString();
-    url += name.substr(0, objectStart);
-    return url + escapedObject(name.substr(objectStart));
+    const auto [bucket, object] = namesIn(address);
+    return prefixOf(endpoint).toStdString().append(bucket) + escapedObject(object);
 }
 
 std::string cloudApiHost()

@@ -19,6 +19,9 @@ std::string withSessionId(const std::string& url, const std::string& id);
 /// Whether it is "gs:" and any number of "/", then bucket, "/", object.
 bool isCloudAddress(const std::string& address);
 
+/// Whether it is such an address with neither bucket nor object missing.
+bool namesCloudObject(const std::string& address);
+
 /// The cloud storage's hosts. Download: streamed reads; Upload: requests with a body; Api: all else.
 enum class CloudEndpoint { Download, Upload, Api };
 

@@ -1,0 +1,350 @@
+#include "kddlib/net/Crc32c.h"
+#include "kddlib/net/CurlShare.h"
+#include "kddlib/net/KxCurlUploadStream.h"
+#include "kddlib/net/KxCurlUploadStreambuf.h"
+#include "support/CloudStore.h"
+#include "support/LogCapture.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <random>
+
+using namespace Kdd;
+using std::chrono::milliseconds;
+using Fault = CloudStore::Fault;
+using testing::HasSubstr;
+
+namespace
+{
+
+constexpr int kStep = KxCurlUploadSession::kGranularity;
+constexpr int kAll = INT_MAX;
+
+const Fault kNone = {};
+const Fault kUnavailable = {0, "503 Busy"};
+const Fault kReset = {0, {}, true};
+const Fault kLostAnswer = {kAll, {}, true};
+
+QByteArray bytesOf(int size)
+{
+    std::mt19937 engine(static_cast<unsigned>(size));
+    QByteArray bytes(size, '\0');
+    std::generate(bytes.begin(), bytes.end(), [&] { return static_cast<char>(engine()); });
+    return bytes;
+}
+
+class Upload : public testing::Test
+{
+protected:
+    ~Upload() override { EXPECT_THAT(store.complaints(), testing::IsEmpty()); }
+
+    KxCurlUploadStream open() { return open(store.url("b/o"), 2 * kStep); }
+
+    KxCurlUploadStream open(const std::string& url, int capacity)
+    {
+        auto session = std::make_unique<KxCurlUploadSession>(
+            factory, share, UploadTarget{url, "Authorization: Bearer t", {}},
+            [this](milliseconds delay) { waits.push_back(delay); });
+        return KxCurlUploadStream(std::make_unique<KxCurlUploadStreambuf>(std::move(session), capacity));
+    }
+
+    static void write(KxCurlUploadStream& stream, const QByteArray& bytes)
+    {
+        stream.write(bytes.constData(), bytes.size());
+    }
+
+    /// Why it failed; empty when it says that it did not.
+    std::string upload(const QByteArray& bytes) { return upload(bytes, store.url("b/o")); }
+
+    std::string upload(const QByteArray& bytes, const std::string& url)
+    {
+        try {
+            KxCurlUploadStream stream = open(url, capacity());
+            for (int at = 0, count = 0; at < bytes.size(); at += count) {
+                count = qMin(pieceSize(), bytes.size() - at);
+                write(stream, bytes.mid(at, count));
+                if (flushes())
+                    stream.flush();
+            }
+            stream.close();
+            EXPECT_EQ(stream.good(), stream.error().empty());
+            return stream.error();
+        } catch (const std::runtime_error& error) {
+            return error.what();
+        }
+    }
+
+    virtual int capacity() { return 2 * kStep; }
+    virtual int pieceSize() { return INT_MAX; }
+    virtual bool flushes() { return false; }
+
+    QByteArray request(size_t index) const { return store.requests().at(index); }
+
+    CloudStore store;
+    CurlShare share{CurlShare::Connections::PerHandle};
+    std::shared_ptr<KxCurlHandleFactory> factory = std::make_shared<KxCurlHandleFactory>(1);
+    std::vector<milliseconds> waits;
+    LogCapture log;
+};
+
+TEST(Crc32c, IsThatOfTheStandardAndMayBeContinued)
+{
+    EXPECT_EQ(crc32c("123456789"), 0xE3069283U);
+    EXPECT_EQ(crc32c(QByteArray(32, '\xFF')), 0x62A8AB43U);
+    const QByteArray bytes = bytesOf(100);
+    for (int i = 0; i <= bytes.size(); ++i)
+        EXPECT_EQ(crc32c(bytes.mid(i), crc32c(bytes.left(i))), crc32c(bytes));
+}
+
+TEST(RetryPolicy, WaitsTwiceAsLongEachTimeAndGivesUpAfterFiveFailures)
+{
+    RetryPolicy policy;
+    for (const int seconds : {1, 2, 4, 8}) {
+        EXPECT_FALSE(policy.exhausted());
+        const milliseconds delay = policy.nextDelay();
+        EXPECT_GE(delay, milliseconds(seconds * 1000));
+        EXPECT_LE(delay, milliseconds(seconds * 1000 + 1000));
+    }
+    EXPECT_EQ(policy.nextDelay(), milliseconds(0));
+    EXPECT_TRUE(policy.exhausted());
+}
+
+TEST_F(Upload, SendsWholeChunksAndThenTheRest)
+{
+    const QByteArray bytes = bytesOf(4 * kStep - 1);
+    KxCurlUploadStream stream = open();
+    write(stream, bytes.left(kStep + 7));
+    stream.flush();
+    write(stream, bytes.mid(kStep + 7));
+    EXPECT_TRUE(stream.isOpen());
+    stream.close();
+    EXPECT_TRUE(stream.good() && !stream.isOpen());
+    EXPECT_EQ(store.object("b/o"), bytes);
+    ASSERT_EQ(store.requests().size(), 4U);
+    EXPECT_TRUE(request(0).contains("\r\nAuthorization: Bearer t\r\n"));
+    EXPECT_TRUE(request(1).contains("\r\nContent-Range: bytes 0-262143/*\r\n"));
+    EXPECT_TRUE(request(2).contains("\r\nContent-Range: bytes 262144-786431/*\r\n"));
+    EXPECT_TRUE(request(3).contains("\r\nContent-Range: bytes 786432-1048574/1048575\r\n"));
+    EXPECT_FALSE(request(1).contains("Expect:") || request(1).contains("Content-Type:"));
+}
+
+TEST_F(Upload, EndsWithAnEmptyChunkWhenAllIsSent)
+{
+    KxCurlUploadStream stream = open();
+    write(stream, bytesOf(kStep));
+    stream.flush();
+    stream.close();
+    EXPECT_TRUE(request(2).contains("\r\nContent-Range: bytes */262144\r\n"));
+    EXPECT_EQ(store.object("b/o"), bytesOf(kStep));
+}
+
+TEST_F(Upload, GoesOnWithTheStreamThatItWasMovedTo)
+{
+    KxCurlUploadStream first = open();
+    write(first, "one ");
+    KxCurlUploadStream second = std::move(first);
+    EXPECT_TRUE(!first.isOpen() && first.bad());
+    first << "lost";
+    second << "two";
+    first = std::move(second);
+    first << " three";
+    {
+        const KxCurlUploadStream closedByItsEnd = std::move(first);
+    }
+    EXPECT_EQ(store.object("b/o"), "one two three");
+}
+
+TEST_F(Upload, MakesNoObjectWhenItIsAbandonedOrAPartWasLost)
+{
+    KxCurlUploadStream stream = open();
+    write(stream, bytesOf(kStep));
+    stream.abandon();
+    EXPECT_FALSE(stream.isOpen());
+    KxCurlUploadStream other = open();
+    store.misbehave({{0, "404 Gone"}});
+    write(other, bytesOf(kStep));
+    other.flush();
+    EXPECT_TRUE(other.bad());
+    other.clear();
+    write(other, "the end");
+    other.close();
+    EXPECT_TRUE(other.fail());
+    EXPECT_EQ(store.object("b/o"), QByteArray());
+    EXPECT_EQ(store.requests().size(), 3U);
+}
+
+struct Trouble
+{
+    const char* name;
+    std::vector<Fault> faults;  // by request: the start, 512 KiB, the last 100
+    size_t waits;
+    const char* error = "";  // empty: the upload heals
+};
+
+/// After the start and the first chunk.
+std::vector<Fault> atTheEnd(const QByteArray& answer)
+{
+    return {kNone, kNone, {kAll, answer}};
+}
+
+std::vector<Fault> atTheStart(const QByteArray& answer)
+{
+    return {{0, answer}};
+}
+
+std::vector<Fault> atAChunk(const QByteArray& answer)
+{
+    return {kNone, {kStep, answer}};
+}
+
+constexpr char kNoUse[] = "indicates that this upload session failed and can not be recovered from.";
+constexpr char kChunkExhausted[] = "Retry policy exhausted in KxCurlUploadSession::uploadChunk().";
+constexpr char kResetExhausted[] = "Retry policy exhausted in KxCurlUploadSession::resetSession().";
+
+/// A chunk and a query in turn.
+std::vector<Fault> forEver(const Fault& fault)
+{
+    std::vector<Fault> faults(200, fault);
+    faults.front() = kNone;
+    return faults;
+}
+
+const Trouble kTroubles[] = {
+    {"StartFailsFourTimes", {kReset, kUnavailable, kReset, {0, "200 OK"}}, 4},
+    {"ChunkIsTakenInParts", {kNone, {kStep}, {100}}, 0},
+    {"AnswerIsLost", {kNone, kLostAnswer}, 1},
+    {"ResetMidway", {kNone, {kStep, {}, true}}, 1},
+    {"UnavailableButStored", {kNone, {kStep, "503 Busy"}}, 1},
+    {"TooManyRequests", {kNone, {0, "429 Slow down"}}, 1},
+    {"NothingTaken", {kNone, {0}}, 1},
+    {"PositionNotTold", {kNone, {kStep, "308 Go on"}}, 1},
+    {"PositionNeverTold", {kNone, {kStep, "308 Go on"}, {0, "308 Go on"}}, 1},
+    {"PositionAskedForInVain", {kNone, kLostAnswer, kUnavailable, kReset}, 3},
+    {"AnswerToTheLastIsLost", {kNone, kNone, kLostAnswer}, 1},
+    {"AnswersToTheLastAreLost", {kNone, kNone, kLostAnswer, kLostAnswer}, 2},
+    {"LastIsStoredButNotEnded", {kNone, kNone, {100}}, 0},
+    {"LastIsAnsweredByCreated", {kNone, kNone, {kAll, "201 Created"}}, 0},
+    {"OtherAddressOnTheWay", {kNone, {kAll, "308 Go on\r\nRange: bytes=0-524287\r\nLocation: /upload0"}}, 0},
+    {"Forbidden", atTheStart("403 Forbidden"), 0, "HTTP code 403indicates"},
+    {"NeverReached", std::vector<Fault>(9, kReset), 4, kChunkExhausted},
+    {"NeverStarted", std::vector<Fault>(9, {0, "200 OK"}), 4, kChunkExhausted},
+    {"NoAddress", atTheStart("201 Created"), 0, "does not name the upload session"},
+    {"AddressOfAFile", atTheStart("201 Created\r\nLocation: file:///etc/passwd"), 0, "file:///etc/passwd"},
+    {"SessionExpired", atAChunk("404 Not Found"), 0, kNoUse},
+    {"SessionGone", forEver({0, "410 Gone"}), 4, kResetExhausted},
+    {"AlwaysUnavailable", forEver(kUnavailable), 4, kResetExhausted},
+    {"AlwaysReset", forEver(kReset), 4, kResetExhausted},
+    {"NothingEverTaken", forEver({0}), 4, kChunkExhausted},
+    {"OneByteAtATime", forEver({1}), 4, kChunkExhausted},
+    {"RunsAhead", atAChunk("308 Go on\r\nRange: bytes=0-524288"), 0, "bytes=0-524288"},
+    {"RunsAheadByFar", atAChunk("308 Go on\r\nRange: bytes=0-18446744073709551615"), 0, "claims to have"},
+    {"NoNumber", atAChunk("308 Go on\r\nRange: bytes=0-99 "), 0, "claims to have"},
+    {"GoesBack",
+     {kNone, {kStep}, {0, "308 Go on\r\nRange: bytes=0-99"}},
+     0,
+     "after 262144 bytes were stored"},
+    {"LosesAChunk",
+     {kNone, kNone, {0, "308 Go on\r\nRange: bytes=0-99"}},
+     0,
+     "after 524288 bytes were stored"},
+    {"EndsBeforeTheLast", atAChunk("200 OK"), 0, "ended the upload before the last"},
+    {"OtherMd5", atTheEnd("200 OK\r\nx-goog-hash: crc32c=oSfDNw==,md5=1B2M2Y8AsgTpgAmY7PhCfg=="), 0,
+     "md5 1B2M"},
+    {"OtherCrc", atTheEnd("200 OK\r\nx-goog-hash: crc32c=AAAAAA=="), 0, "crc32c AAAAAA== instead of "},
+    {"OtherLengthInJson", atTheEnd("200 OK\r\n\r\n{\"size\": \"5\"}"), 0, "length 5 instead of 524388"},
+    {"OtherLength", atTheEnd("200 OK\r\nx-goog-stored-content-length: 5"), 0, "length 5 instead of 524388"},
+};
+
+class TroubledUpload : public Upload, public testing::WithParamInterface<Trouble>
+{
+};
+
+TEST_P(TroubledUpload, EitherLosesNothingOrSaysWhyItEnded)
+{
+    const QByteArray bytes = bytesOf(2 * kStep + 100);
+    const bool heals = GetParam().error[0] == '\0';
+    store.misbehave(GetParam().faults);
+    const std::string error = upload(bytes);
+    EXPECT_THAT(error, HasSubstr(GetParam().error));
+    EXPECT_EQ(error.empty(), heals);
+    EXPECT_TRUE(!heals || store.object("b/o") == bytes);
+    EXPECT_EQ(waits.size(), GetParam().waits);
+}
+
+INSTANTIATE_TEST_SUITE_P(Net, TroubledUpload, testing::ValuesIn(kTroubles),
+                         [](const auto& trouble) { return trouble.param.name; });
+
+TEST_F(Upload, KeepsTheAuthorizationFromOtherHosts)
+{
+    const ScriptedServer other([](const QByteArray&) {
+        return ScriptedServer::Reply{"HTTP/1.1 200 OK\r\nConnection: close\r\n\r\n"};
+    });
+    store.misbehave(atTheStart("201 Created\r\nLocation: " + QByteArray::fromStdString(other.url("s"))));
+    EXPECT_EQ(upload("bytes"), "");
+    EXPECT_TRUE(other.requests().at(0).endsWith("\r\n\r\nbytes"));
+    EXPECT_FALSE(other.requests().at(0).contains("Authorization"));
+    EXPECT_TRUE(other.requests().at(0).contains(
+        "Host: " + QByteArray::fromStdString(other.url("").substr(7)).chopped(1)));
+}
+
+TEST_F(Upload, DoesNotLeaveHttps)
+{
+    const NginxServer secure(NginxServer::Scheme::Https,
+                             "location / { add_header Location http://127.0.0.1:1/s; return 201; }");
+    EXPECT_THAT(upload("bytes", secure.url("b/o")), HasSubstr("http://127.0.0.1:1/s"));
+}
+
+/// Faults that an upload may meet, of which the last kinds are beyond healing.
+Fault randomFault(std::mt19937& engine)
+{
+    const int takes = static_cast<int>(engine() % (3 * kStep));
+    const Fault kKinds[] = {kNone,
+                            kNone,
+                            {takes},
+                            {takes, {}, true},
+                            kLostAnswer,
+                            {takes, "503 Busy"},
+                            {takes, "429 Slow down"},
+                            {takes, "308 Go on"},
+                            {0, "308 Go on"},
+                            {takes, "500 Oops"}};
+    const Fault kFatalKinds[] = {{takes, "404 Gone"},
+                                 {takes, "308 Go on\r\nRange: bytes=0-99999999"},
+                                 {takes, "200 OK\r\nx-goog-hash: md5=AAAAAAAAAAAAAAAAAAAAAA=="}};
+    return engine() % 60 == 0 ? kFatalKinds[engine() % std::size(kFatalKinds)]
+                              : kKinds[engine() % std::size(kKinds)];
+}
+
+class RandomUpload : public Upload
+{
+protected:
+    int capacity() override { return kStep * static_cast<int>(1 + engine() % 3); }
+    int pieceSize() override { return static_cast<int>(1 + engine() % (2 * kStep)); }
+    bool flushes() override { return engine() % 4 == 0; }
+
+    std::mt19937 engine{1};
+};
+
+TEST_F(RandomUpload, IsWholeWheneverItSaysSo)
+{
+    std::map<std::string, int> outcomes;  // by the first words of the error
+    for (int run = 0; run < 100; ++run) {
+        CloudStore stage;
+        const QByteArray bytes = bytesOf(static_cast<int>(engine() % (5 * kStep)));
+        std::vector<Fault> faults(engine() % 20);
+        std::generate(faults.begin(), faults.end(), [this] { return randomFault(engine); });
+        stage.misbehave(faults);
+        const std::string error = upload(bytes, stage.url("b/o"));
+        EXPECT_THAT(stage.complaints(), testing::IsEmpty()) << run;
+        EXPECT_TRUE(!error.empty() || stage.object("b/o") == bytes) << run;
+        ++outcomes[error.substr(0, error.find(' ', 10))];
+    }
+    EXPECT_GT(outcomes[""], 25);
+    for (const auto& [words, count] : outcomes)
+        EXPECT_THAT(words, testing::AnyOf("", "HTTP code 404indicates", "Retry policy", "The cloud storage",
+                                          "The object"))
+            << count;
+}
+
+}  // namespace
