@@ -159,16 +159,18 @@ bool Fetch::isComplete()
 void report(const GlobalOptions& options, const GetRequest& request, const QString& target, qint64 bytes,
             qint64 resumedAt)
 {
-    if (options.json)
+    if (options.json) {
         printJson({{QStringLiteral("url"), QString::fromUtf8(request.url)},
                    {QStringLiteral("file"), target},
                    {QStringLiteral("bytes"), bytes},
                    {QStringLiteral("resumedAt"), resumedAt}});
-    else if (!options.quiet)
-        std::printf("%s: %s%s\n", qUtf8Printable(target), qUtf8Printable(humanBytes(bytes)),
-                    resumedAt > 0 ? qUtf8Printable(QStringLiteral(", of which ") + humanBytes(resumedAt) +
-                                                   QStringLiteral(" were there"))
-                                  : "");
+        return;
+    }
+    QString line = target + QStringLiteral(": ") + humanBytes(bytes);
+    if (resumedAt > 0)
+        line += QStringLiteral(", of which ") + humanBytes(resumedAt) + QStringLiteral(" were there");
+    if (!options.quiet)
+        std::printf("%s\n", qUtf8Printable(line));
 }
 
 }  // namespace

@@ -47,8 +47,8 @@ std::string bytes(const QJsonValue& value)
 
 }  // namespace
 
-PartialFile::PartialFile(const QString& target)
-    : mTarget(target)
+PartialFile::PartialFile(QString target)
+    : mTarget(std::move(target))
 {
 }
 

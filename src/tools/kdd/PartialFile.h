@@ -26,7 +26,7 @@ public:
         bool isRecognisable() const { return length > 0 && version.isKnown(); }
     };
 
-    explicit PartialFile(const QString& target);
+    explicit PartialFile(QString target);
 
     QString path() const { return mTarget + QStringLiteral(".part"); }
 

@@ -29,8 +29,10 @@ OFCondition parseStream(DcmInputStream& stream, DcmFileFormat& file, const Parse
 template <typename Stream>
 OFCondition parseDicom(DepthLimited<Stream>& stream, DcmFileFormat& file, const ParseOptions& options)
 {
-    const OFCondition condition = parseStream(stream, file, options);
-    return stream.isTooDeep() ? OFCondition(EC_NestedTooDeep) : condition;
+    OFCondition condition = parseStream(stream, file, options);
+    if (stream.isTooDeep())
+        condition = EC_NestedTooDeep;
+    return condition;
 }
 
 }  // namespace Kdd

@@ -17,13 +17,8 @@ KxCurlDownloadStream::~KxCurlDownloadStream() = default;
 
 KxCurlDownloadStream::KxCurlDownloadStream(KxCurlDownloadStream&& other) noexcept
     : std::istream(std::move(other))
-    , mBuffer(std::move(other.mBuffer))
-    , mStatus(std::move(other.mStatus))
-    , mFailure(std::move(other.mFailure))
 {
-    // The base hands over its state and leaves the buffer to us.
-    set_rdbuf(mBuffer.get());
-    other.rdbuf(nullptr);
+    takeBuffer(other);
 }
 
 KxCurlDownloadStream& KxCurlDownloadStream::operator=(KxCurlDownloadStream&& other) noexcept
@@ -31,12 +26,19 @@ KxCurlDownloadStream& KxCurlDownloadStream::operator=(KxCurlDownloadStream&& oth
     if (this == &other)
         return *this;
     std::istream::operator=(std::move(other));
+    takeBuffer(other);
+    return *this;
+}
+
+/// The standard move takes the state along but leaves the other stream its buffer, which now is ours.
+void KxCurlDownloadStream::takeBuffer(KxCurlDownloadStream& other)
+{
     mBuffer = std::move(other.mBuffer);
     mStatus = std::move(other.mStatus);
     mFailure = std::move(other.mFailure);
     set_rdbuf(mBuffer.get());
+    other.exceptions(goodbit);
     other.rdbuf(nullptr);
-    return *this;
 }
 
 bool KxCurlDownloadStream::isOpen() const

@@ -48,6 +48,8 @@ public:
     std::string failure() const;
 
 private:
+    void takeBuffer(KxCurlDownloadStream& other);
+
     std::unique_ptr<KxCurlDownloadStreambuf> mBuffer;
     KxHttpStatus mStatus;
     std::string mFailure;
