@@ -27,6 +27,10 @@ constexpr int kMaxRun = 1000 * 1000;
 /// Images named by the volumes of one series, taken together.
 constexpr int kMaxVolumeImages = 1000 * 1000;
 
+/// The XML of a correction [bytes], and the attributes that it replaces.
+constexpr int kMaxJobXml = 1024 * 1024;
+constexpr int kMaxSubstitutions = 1000;
+
 /// The body of an HTTP response that is read into memory as a whole [bytes].
 constexpr qint64 kMaxResponseSize = qint64(1024) * 1024 * 1024;
 

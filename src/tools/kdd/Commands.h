@@ -80,10 +80,19 @@ struct SampleRequest
     unsigned seed = 1;
 };
 
+struct CorrectionRequest
+{
+    QString job;  ///< file of the job's XML
+    QByteArray study;
+    QList<QByteArray> images;
+    QString imageList;  ///< file that names further images, one on each line; empty for none
+};
+
 Outcome runAdd(const GlobalOptions& options, const QList<QByteArray>& paths);
 Outcome runIndex(const GlobalOptions& options, const QList<QByteArray>& paths);
 Outcome runBuild(const GlobalOptions& options, const BuildRequest& request);
 Outcome runSync(const GlobalOptions& options, const QByteArray& study);
+Outcome runCorrection(const GlobalOptions& options, const CorrectionRequest& request);
 Outcome runStack(const GlobalOptions& options, const StackRequest& request);
 Outcome runPreviews(const GlobalOptions& options, const PreviewsRequest& request);
 Outcome runList(const GlobalOptions& options);

@@ -207,6 +207,7 @@ private:
             ->required();
         mNode.addTo(declare("delete", "Delete a study's tag file, a series or an image",
                             [this] { return runDelete(mGlobal, mNode.selection()); }));
+        declareCorrection();
         CLI::App& sample = declare("sample", "Write synthetic studies", [this] {
             return runSample(mGlobal, {path(mFolder), mImages, mSeed});
         });
@@ -214,6 +215,21 @@ private:
         sample.add_option("--images", mImages, "About how many images in all")
             ->check(CLI::Range(1, 10000000));
         sample.add_option("--seed", mSeed, "Another seed gives other studies");
+    }
+
+    void declareCorrection()
+    {
+        CLI::App& correction =
+            declare("qa", "Correct attributes of images, or move images to another study", [this] {
+                return runCorrection(mGlobal, {path(mJob), bytes(mNode.study), paths(), path(mImageList)});
+            });
+        correction.add_option("JOB", mJob, "XML file that says what to correct")->required();
+        correction
+            .add_option("--study", mNode.study,
+                        "Study Instance UID, or a unique beginning of it; of a move all of the new study's")
+            ->required();
+        correction.add_option("--image", mPaths, "SOP Instance UIDs");
+        correction.add_option("--images", mImageList, "File of SOP Instance UIDs, one on each line");
     }
 
     void declareReading()
@@ -277,6 +293,8 @@ private:
 
     std::vector<std::string> mPaths;
     NodeArguments mNode;
+    std::string mJob;
+    std::string mImageList;
     std::string mFolder;
     std::string mUrl;
     std::string mFile;

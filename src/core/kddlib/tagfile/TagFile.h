@@ -30,8 +30,11 @@ namespace Kdd
 
 class Item;
 class TagMap;
+struct QAData;
+struct QASeriesMove;
 struct VolumeInfo;
 enum class Flush;
+enum class IfAbsent;
 
 /// One study's metadata cache: the tree study, series, image of `TagMap`s with indexes by UID, and its file.
 ///
@@ -53,7 +56,8 @@ public:
         PowerLoss,  ///< flushed to disk before the write returns
     };
 
-    /// Bits of `setDebugOptions`.
+    /// Bits of `setDebugOptions`: tell how long corrections take, measure the size before optimisation.
+    static constexpr unsigned int kTimings = 1;
     static constexpr unsigned int kMeasureUnoptimised = 2;
 
     TagFile() = default;
@@ -207,6 +211,25 @@ public:
     /// cannot be written is warned about and passed over. How many were written.
     int exportPreviews(const QString& folder) const;
 
+    // ---- corrections
+
+    /// Applies a correction to the tag files of its study and, for a move, of its old study, which are held exclusively
+    /// from before they are read until after they are written. Values are replaced image by image; what was changed
+    /// goes to each image's `AuditLog`. An image whose study, series or own UID is changed goes to where it then
+    /// belongs, with its preview and its part of the volumes. Images that are not found are counted only, and a job
+    /// all of whose values are there already changes nothing.
+    ///
+    /// False, with the reason in `message`, when a file could not be held, read or written, or when a value cannot be
+    /// replaced without losing something. Then both files are as they were, but for one case that the message tells: a
+    /// move whose images stand in both studies. As after the death of the process in the middle, running the job again
+    /// completes it. A job whose old study is its study becomes an edit.
+    static bool applyQA(QAData& job, QString& message);
+
+    /// Gives back the volumes that were taken out of a series before its images changed: each part of a volume to the
+    /// series that now holds its images. A volume that stays whole keeps all it says; one that is divided has only its
+    /// images and slices in common with the volume file, so its parts are bare.
+    void updateVolumesAfterQA(QASeriesMove& move);
+
     // ---- the image database
 
     /// Gives every image that `info` names its file path. Images not held are warned about, and `complete` becomes
@@ -279,6 +302,8 @@ private:
     };
 
     class BodyReader;
+    class QAJob;
+    class QAVolumes;
 
     static QByteArray imageKey(const TagMap& image);
     void replaceImage(TagMap* old);
@@ -286,6 +311,7 @@ private:
     void dropSeries(TagMap* series);
     void dropImage(TagMap* image);
     void dropStudyIfEmpty(TagMap* study);
+    static void forgetUnseen(TagMap& node);
 
     TagMap* makeImage(TagMap* series, const QByteArray& sopUID);
     TagMap* findImage(const Kxg::ImageFile& file) const;
@@ -304,6 +330,8 @@ private:
     static Flush flushing();
     bool openForReading(const QString& path, bool keepOpen);
     bool openWhole(const QString& path);
+    bool finishInterruptedWrite(const QString& path);
+    bool holdStudy(const QByteArray& studyUID, IfAbsent ifAbsent);
     bool createAndWrite(const QString& path);
     bool writeInto(QFile& locked, const QString& path, bool cut);
 

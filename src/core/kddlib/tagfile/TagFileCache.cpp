@@ -106,8 +106,37 @@ bool TagFile::openWhole(const QString& path)
     const LockedOpenResult opened =
         openLockedFile(mCacheFile, path, FileLock::Exclusive, IfAbsent::Fail, kReadPolling);
     mLockedOut = opened.failure == OpenFailure::Locked;
+    return opened ? finishInterruptedWrite(path) : fail(systemText(opened.systemError));
+}
+
+/// Opens the study's file exclusively and reads it. An absent or empty file holds no study, which is no failure.
+bool TagFile::holdStudy(const QByteArray& studyUID, IfAbsent ifAbsent)
+{
+    clear();
+    mFailure.clear();
+    const QString path = cacheFilePathForStudy(studyUID.constData());
+    mCacheFilePath = path;
+    if (ifAbsent == IfAbsent::Create)
+        QDir().mkpath(QFileInfo(path).path());
+    const LockedOpenResult opened =
+        openLockedFile(mCacheFile, path, FileLock::Exclusive, ifAbsent, kReadPolling);
+    mLockedOut = opened.failure == OpenFailure::Locked;
+    if (opened.failure == OpenFailure::NotFound && ifAbsent == IfAbsent::Fail)
+        return true;
     if (!opened)
         return fail(systemText(opened.systemError));
+    if (!finishInterruptedWrite(path))
+        return false;
+    QDataStream in(&mCacheFile);
+    if (mCacheFile.size() == 0 || readCacheFile(in, studyUID.constData()))
+        return true;
+    mCacheFile.close();
+    return false;
+}
+
+/// What the last writer of the file, held exclusively now, did not bring to its end.
+bool TagFile::finishInterruptedWrite(const QString& path)
+{
     const QString reason = recoverInterruptedWrite(mCacheFile, path, flushing());
     if (reason.isEmpty())
         return true;

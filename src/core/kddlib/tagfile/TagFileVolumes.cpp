@@ -1,7 +1,7 @@
 #include "kddlib/previews/QuadrantNavigation.h"
 #include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagfile/VolumeIndex.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
-#include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/Volume.h"
 #include "kddlib/volumes/VolumeInfo.h"
@@ -19,19 +19,6 @@ namespace
 {
 
 const char* const kCategory = "TagFile";
-
-/// Names the volume in one of its images: the index as one byte, further volumes appended as one byte each.
-void addVolumeIndex(TagMap& image, int index)
-{
-    const TagElement* held = image.findElement(kVolumeIndex);
-    if (held == nullptr) {
-        image.putAndInsertInt(kVolumeIndex, index);
-    } else if (held->vr() == VrCode::OB) {
-        QByteArray indexes = held->value();
-        indexes.append(static_cast<char>(index));
-        image.putAndInsertValue(kVolumeIndex, VrCode::OB, indexes);
-    }
-}
 
 /// What a copied image takes over from the series that it becomes part of.
 const DcmTagKey kSeriesIdentity[] = {DCM_StudyInstanceUID,  DCM_SeriesInstanceUID, DCM_SeriesNumber,

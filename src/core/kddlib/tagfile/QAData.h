@@ -1,0 +1,66 @@
+#pragma once
+
+#include "platform/base/Export.h"
+
+#include <QByteArray>
+#include <QList>
+#include <QString>
+#include <QVector>
+
+#include <dcmtk/config/osconfig.h>
+
+#include <dcmtk/dcmdata/dctagkey.h>
+
+namespace Kdd
+{
+
+/// An attribute and the text it gets. A null text is no value, an empty one an empty value. Of Pixel Data nothing is
+/// replaced; the text is a remark for the audit log.
+struct QASubstitution
+{
+    DcmTagKey key;
+    QString value;
+};
+
+/// A correction of stored images, to be applied by `TagFile::applyQA`: an edit of a study, or with an old study a move
+/// of images from there into the study.
+///
+/// A value.
+struct KDD_EXPORT QAData
+{
+    QByteArray studyUID;
+    QByteArray oldStudyUID;  ///< empty for an edit
+    QVector<QASubstitution> substitutions;
+    QByteArray timestamp;            ///< "yyyyMMddhhmmss", or empty for now
+    QByteArray login;                ///< who corrects, in Latin-1; may be empty
+    QList<QByteArray> images;        ///< SOP Instance UIDs
+    QList<QByteArray> cacheEntries;  ///< names of file-cache entries, for the caller's use
+
+    /// What `applyQA` did.
+    struct Outcome
+    {
+        int changed = 0;             ///< images with a new entry in their audit log
+        int moved = 0;               ///< images that are now in another study, series or under another UID
+        QList<QByteArray> notFound;  ///< images that no study concerned holds
+        bool isLockedOut = false;    ///< it failed because others held a tag file all the time: try again
+    };
+
+    Outcome outcome;
+
+    /// Takes old study, substitutions, timestamp and login from the XML of a job:
+    ///
+    ///     <Job>
+    ///       <Timestamp>20240131120000</Timestamp> <Login>anna</Login>
+    ///       <Substitutions OldSUID="1.2.3">
+    ///         <Tag Group="0010" Element="0010"><Value>Doe^Jane</Value></Tag>
+    ///       </Substitutions>
+    ///     </Job>
+    ///
+    /// Elements count by their names, wherever they stand; others are passed over. False, with the job as it was and
+    /// the line and the reason in `message`, for XML that is damaged, larger than `kMaxJobXml` or has a document type,
+    /// for a number, timestamp or login that is none, for a Tag without Value (but for Pixel Data) or that stands
+    /// twice.
+    bool parse(const QByteArray& xml, QString& message);
+};
+
+}  // namespace Kdd

@@ -1,0 +1,169 @@
+#include "kddlib/tagfile/QAVolumes.h"
+#include "kddlib/tagfile/VolumeIndex.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
+#include "kddlib/tagmodel/TagMap.h"
+
+#include <memory>
+
+namespace Kdd
+{
+
+namespace
+{
+
+/// The images that one series holds, at their places; null for the others.
+QVector<TagMap*> ofSeries(QVector<TagMap*> images, const TagMap* series)
+{
+    for (TagMap*& image : images) {
+        if (image != nullptr && image->parent() != series)
+            image = nullptr;
+    }
+    return images;
+}
+
+QVector<TagMap*> withoutGaps(QVector<TagMap*> images)
+{
+    images.removeAll(nullptr);
+    return images;
+}
+
+/// The former place of the image that a slice shows.
+int imageOfSlice(const Volume& volume, int slice)
+{
+    return slice < volume.slices().size() ? volume.slices().at(slice).image : slice;
+}
+
+}  // namespace
+
+void TagFile::updateVolumesAfterQA(QASeriesMove& move)
+{
+    QAVolumes(*this, move).giveBack();
+}
+
+QASeriesMove TagFile::QAVolumes::takeOut(TagFile& source, TagMap& series)
+{
+    QASeriesMove move;
+    move.source = &source;
+    move.seriesUID = series.uid(TagMap::SeriesLevel);
+    for (const Volume* volume : series.volumes()) {
+        QASeriesMove::Stack stack = {*volume, {}};
+        for (int i = 0; i < volume->numImages(); ++i)
+            stack.images.append(imageKey(*volume->image(i)));
+        move.stacks.push_back(stack);
+    }
+    series.clearVolumes();
+    return move;
+}
+
+void TagFile::QAVolumes::giveBack()
+{
+    if (TagMap* series = mMove.source->findSeries(mMove.seriesUID))
+        mTouched.append(series);
+    for (const QASeriesMove::Stack& stack : mMove.stacks)
+        giveBack(stack);
+    mMove.stacks.clear();
+    for (TagMap* series : qAsConst(mTouched))
+        renumber(*series);
+}
+
+TagMap* TagFile::QAVolumes::imageNow(const QByteArray& formerKey) const
+{
+    if (!mMove.movedTo.contains(formerKey))
+        return mMove.source->findImage(formerKey);
+    const QByteArray key = mMove.movedTo.value(formerKey);
+    TagMap* image = mDestination.findImage(key);
+    return image != nullptr ? image : mMove.source->findImage(key);
+}
+
+QVector<TagMap*> TagFile::QAVolumes::imagesNow(const QASeriesMove::Stack& stack) const
+{
+    QVector<TagMap*> images;
+    images.reserve(stack.images.size());
+    for (const QByteArray& key : stack.images)
+        images.append(imageNow(key));
+    return images;
+}
+
+void TagFile::QAVolumes::giveBack(const QASeriesMove::Stack& stack)
+{
+    const QVector<TagMap*> images = imagesNow(stack);
+    QVector<TagMap*> holders;
+    for (const TagMap* image : images) {
+        if (image != nullptr && !holders.contains(image->parent()))
+            holders.append(image->parent());
+    }
+    // One that never had images is only known to exist, in the series that it was found in.
+    TagMap* home = mMove.source->findSeries(mMove.seriesUID);
+    if (images.isEmpty() && home != nullptr)
+        holders.append(home);
+    const bool isWhole = holders.size() == 1 && !images.contains(nullptr);
+    for (TagMap* series : qAsConst(holders))
+        attach(series, stack.volume, ofSeries(images, series), isWhole);
+    if (isWhole || !stack.volume.hasPreview())
+        return;
+    keepPreview(stack.volume, images);
+    for (TagMap* series : qAsConst(holders))
+        obtainPreview(*series, withoutGaps(ofSeries(images, series)));
+}
+
+/// What divides a volume leaves gaps between its slices, so nothing is said about the geometry of a part; nor is the
+/// volume file named, which holds all the slices.
+void TagFile::QAVolumes::attach(TagMap* series, const Volume& volume, const QVector<TagMap*>& images,
+                                bool isWhole)
+{
+    auto part = isWhole ? std::make_unique<Volume>(volume) : std::make_unique<Volume>();
+    part->attachImages(series->volumes().size(), withoutGaps(images));
+    QHash<const TagMap*, int> places;
+    for (int i = 0; i < part->numImages(); ++i)
+        places.insert(part->image(i), i);
+    QVector<Slice> slices;
+    for (int i = 0; i < volume.slices().size(); ++i) {
+        const Slice former = volume.slices().at(i);
+        const int place = places.value(images.value(former.image, nullptr), -1);
+        if (place >= 0 || isWhole)
+            slices.append({place, former.frame});
+    }
+    part->setSlices(slices);
+    if (!isWhole)
+        part->setGeometry({0, 0, slices.size()}, Box3f(), Mat4f());
+    series->addBareVolume(part.release());
+    if (!mTouched.contains(series))
+        mTouched.append(series);
+}
+
+/// Volumes are known by their place in the series, and what an image says must agree with that.
+void TagFile::QAVolumes::renumber(TagMap& series)
+{
+    series.deleteElement(kVolumeIndex);
+    if (series.findElement(kVolumeIndex) != nullptr)
+        series.markAsMissing(kVolumeIndex);
+    for (TagMap* image : series.children())
+        image->deleteElement(kVolumeIndex);
+    for (int i = 0; i < series.volumes().size(); ++i) {
+        Volume& volume = *series.volumes().at(i);
+        volume.mVolumeIndex = i;
+        for (int j = 0; j < volume.numImages(); ++j)
+            addVolumeIndex(*volume.image(j), i);
+    }
+}
+
+/// The preview of a volume that is divided shows the image in its middle; it goes on with that one.
+void TagFile::QAVolumes::keepPreview(const Volume& volume, const QVector<TagMap*>& images)
+{
+    TagMap* shown = images.value(imageOfSlice(volume, volume.dims().z / 2), nullptr);
+    if (shown != nullptr && shown->findElement(kPreview) == nullptr)
+        shown->putAndInsertValue(kPreview, VrCode::OB, volume.previewData());
+}
+
+void TagFile::QAVolumes::obtainPreview(TagMap& series, const QVector<TagMap*>& images)
+{
+    const TagMap& middle = *images.at(images.size() / 2);
+    const QByteArray path = filePathOf(middle);
+    if (path.isEmpty() || !series.findPreviewData(nullptr).isEmpty())
+        return;
+    const QByteArray key = imageKey(middle);
+    TagFile& holder = mDestination.findImage(key) == &middle ? mDestination : *mMove.source;
+    holder.addPreview(key, QString::fromLocal8Bit(path));
+}
+
+}  // namespace Kdd
