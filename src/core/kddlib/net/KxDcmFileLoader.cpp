@@ -82,10 +82,17 @@ try {
     DepthLimited<DcmInputHttpStream> stream;
     stream.setBearerToken(bearerToken().c_str());
     stream.request(url.c_str());
-    return isAnswered(url.c_str(), stream.curlStream()) ? parseDicom(stream, file, options)
-                                                        : EC_InvalidStream;
+    if (!isAnswered(url.c_str(), stream.curlStream()))
+        return EC_InvalidStream;
+    return parseDicom(stream, file, options);
 } catch (const std::exception& fault) {
     return refuse(url.c_str(), fault);
+}
+
+OFCondition loadLocal(const char* name, DcmFileFormat& file, const ParseOptions& options)
+{
+    DepthLimited<LocalFileStream> stream(name);
+    return parseDicom(stream, file, options);
 }
 
 OFCondition load(const char* name, DcmFileFormat& file, Mode mode, ParseOptions options)
@@ -100,8 +107,7 @@ OFCondition load(const char* name, DcmFileFormat& file, Mode mode, ParseOptions 
     std::string url = name ? name : "";
     if (mode == Mode::StorageServer && KxDcmFileLoader::convertPathToURL(url, nullptr))
         return loadFromStorage(url, file, options);
-    DepthLimited<LocalFileStream> stream(url.c_str());
-    return parseDicom(stream, file, options);
+    return loadLocal(url.c_str(), file, options);
 }
 
 }  // namespace
