@@ -1,6 +1,7 @@
 #include "kddlib/net/ByteRange.h"
 
-#include <algorithm>
+#include <QByteArray>
+
 #include <charconv>
 #include <limits>
 
@@ -20,6 +21,12 @@ std::optional<qint64> parseByteCount(std::string_view digits)
     const auto [stop, error] = std::from_chars(digits.data(), end, count);
     const bool isNumber = error == std::errc() && stop == end && digits.front() != '-';
     return isNumber ? std::optional(count) : std::nullopt;
+}
+
+bool isRangeHeader(const std::string& line)
+{
+    constexpr std::string_view kName = "range:";
+    return qstrnicmp(line.c_str(), kName.data(), kName.size()) == 0;
 }
 
 std::string ByteRange::text() const

@@ -56,6 +56,9 @@ private:
     qint64 mLast = 0;  // Suffix: how many
 };
 
+/// Whether a header line of a request asks for a range.
+bool isRangeHeader(const std::string& line);
+
 /// A decimal number without sign, below 2^63.
 std::optional<qint64> parseByteCount(std::string_view digits);
 

@@ -48,11 +48,6 @@ CurlShare::Connections connectionsOfSite()
                                            : CurlShare::Connections::PerHandle;
 }
 
-bool isRangeHeader(const std::string& line)
-{
-    return qstrnicmp(line.c_str(), "range:", 6) == 0;
-}
-
 /// The rest of a stream of which nobody says how long it is, up to the bound of a response.
 QByteArray readUntilEnd(std::istream& stream)
 {

@@ -2,8 +2,6 @@
 
 #include "platform/base/LogFile.h"
 
-#include <QtGlobal>
-
 #include <algorithm>
 #include <cstring>
 #include <string_view>
@@ -27,20 +25,13 @@ constexpr int kRangeNotSatisfiable = 416;
 
 constexpr char kRangeIgnored[] = "The server sends the whole object where a range was asked for";
 
-constexpr std::string_view kRangeHeader = "range:";
-constexpr std::string_view kRangeUnit = "bytes=";
-
-bool isRangeHeader(const std::string& line)
-{
-    return qstrnicmp(line.c_str(), kRangeHeader.data(), kRangeHeader.size()) == 0;
-}
-
+/// The range that a header line asks for.
 WantedRange rangeOf(std::string_view headerLine)
 {
-    headerLine.remove_prefix(kRangeHeader.size());
-    headerLine.remove_prefix(std::min(headerLine.find_first_not_of(' '), headerLine.size()));
-    const bool isInBytes = headerLine.substr(0, kRangeUnit.size()) == kRangeUnit;
-    return WantedRange(isInBytes ? headerLine.substr(kRangeUnit.size()) : std::string_view());
+    constexpr std::string_view kUnit = "bytes=";
+    const std::size_t start = headerLine.find(kUnit);
+    const bool isInBytes = start != std::string_view::npos;
+    return WantedRange(isInBytes ? headerLine.substr(start + kUnit.size()) : std::string_view());
 }
 
 std::size_t spillCapacity(const std::optional<ByteRange>& range)
