@@ -3,7 +3,8 @@ set(KDD_SANITIZE "" CACHE STRING "Sanitizers to build with, for example address,
 
 add_library(kdd_options INTERFACE)
 target_compile_options(kdd_options INTERFACE
-  -Wall -Wextra -Wpedantic -Wshadow -Wconversion -Wsign-conversion -Wnon-virtual-dtor -Woverloaded-virtual -Werror)
+  -Wall -Wextra -Wpedantic -Wshadow -Wconversion -Wsign-conversion -Werror
+  $<$<COMPILE_LANGUAGE:CXX>:-Wnon-virtual-dtor -Woverloaded-virtual>)
 target_compile_definitions(kdd_options INTERFACE
   QT_NO_CAST_FROM_ASCII QT_NO_CAST_TO_ASCII QT_NO_URL_CAST_FROM_STRING QT_NO_FOREACH)
 if(KDD_SANITIZE)

@@ -5,8 +5,8 @@
 #include "platform/database/SqlConnection.h"
 
 #include <QMap>
-#include <QMutex>
-#include <QMutexLocker>
+
+#include <mutex>
 
 namespace Kxg
 {
@@ -16,7 +16,7 @@ namespace
 const char kSection[] = "Storage";
 const char kVolumeKey[] = "Volume";
 
-QMutex sMutex;
+std::mutex sMutex;
 QVector<QByteArray> sVolumes;  // guarded by sMutex
 
 /// 0 for the key of something else.
@@ -43,7 +43,7 @@ Kdd::Result StorageManager::retrieveStorageVolumes()
                 volumes.insert(number, rows.bytes(1));
     });
     if (result.good()) {
-        const QMutexLocker locker(&sMutex);
+        const std::lock_guard<std::mutex> locker(sMutex);
         sVolumes = volumes.values().toVector();
     }
     return result;
@@ -51,7 +51,7 @@ Kdd::Result StorageManager::retrieveStorageVolumes()
 
 QVector<QByteArray> StorageManager::storageVolumes()
 {
-    const QMutexLocker locker(&sMutex);
+    const std::lock_guard<std::mutex> locker(sMutex);
     return sVolumes;
 }
 

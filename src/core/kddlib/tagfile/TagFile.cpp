@@ -9,10 +9,12 @@
 #include "platform/base/LogFile.h"
 #include "platform/base/Stopwatch.h"
 #include "platform/database/StorageManager.h"
+#include "platform/resources/ExResource.h"
 
 #include <dcmtk/dcmdata/dcdeftag.h>
 #include <dcmtk/dcmdata/dcfilefo.h>
 
+#include <mutex>
 #include <tuple>
 
 namespace Kdd
@@ -31,8 +33,18 @@ TagFile::~TagFile()
 
 const char* TagFile::metaFolder()
 {
-    if (sMetaFolder.isEmpty())
-        setMetaFolder(Kxg::StorageManager::getMetaFolder().constData());
+    // A program that only has the C functions cannot set the folder at its start: threads may come here together.
+    static std::mutex mutex;
+    const std::lock_guard<std::mutex> lock(mutex);
+    if (!sMetaFolder.isEmpty())
+        return sMetaFolder.constData();
+    QByteArray configured = ExResource::metaFolder();
+    if (configured.isEmpty())
+        configured = Kxg::StorageManager::getMetaFolder();
+    // Not kept: a database that cannot be asked now may answer the next time.
+    if (configured.isEmpty())
+        return "./";
+    setMetaFolder(configured.constData());
     return sMetaFolder.constData();
 }
 

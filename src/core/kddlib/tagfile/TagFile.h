@@ -79,7 +79,8 @@ public:
     /// Whether any of the bits is set.
     static bool debugOption(unsigned int bits) { return (sDebugOptions & bits) != 0; }
 
-    /// The folder above all tag files; ends in "/".
+    /// The folder above all tag files; ends in "/". Until one is set it is what the site's settings say, else the image
+    /// database, else "./". May be asked for on any thread.
     static const char* metaFolder();
     static void setMetaFolder(const char* path);
 
@@ -320,6 +321,7 @@ private:
 
     QVector<TagMap*> imagesOf(const VolumeInfo& info, int volumeIndex) const;
 
+    bool write(QDataStream& out, CompressionMode mode);
     QByteArray serialized(CompressionMode mode);
     void recordSizes(qint64 storedBody, qint64 body, const QList<QByteArray>& blobs);
 

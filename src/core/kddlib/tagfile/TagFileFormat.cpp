@@ -155,6 +155,11 @@ int writeStudy(KxMsg& body, const TagMap& study, QList<QByteArray>& blobs)
 
 bool TagFile::writeCacheFile(QDataStream& out)
 {
+    return write(out, sCompressionMode);
+}
+
+bool TagFile::write(QDataStream& out, CompressionMode mode)
+{
     const Stopwatch stopwatch;
     KxMsg body;
     body.reserve(kBodyReservation);
@@ -166,9 +171,9 @@ bool TagFile::writeCacheFile(QDataStream& out)
     }
     if (body.size() > kMaxBodySize)
         return fail(QLatin1String(kTooLarge));
-    const QByteArray stored = compressed(body.bytes(), sCompressionMode);
+    const QByteArray stored = compressed(body.bytes(), mode);
     out.writeRawData(kMagic, sizeof kMagic);
-    out << kVersion << quint8(0) << kLayout << static_cast<quint8>(sCompressionMode);
+    out << kVersion << quint8(0) << kLayout << static_cast<quint8>(mode);
     out << static_cast<qint32>(stored.size());
     out.writeRawData(stored.constData(), stored.size());
     out << static_cast<qint32>(blobs.size());
@@ -337,13 +342,9 @@ bool TagFile::failReading(const char* reason)
 
 QByteArray TagFile::serialized(CompressionMode mode)
 {
-    const CompressionMode before = sCompressionMode;
-    sCompressionMode = mode;
     QByteArray content;
     QDataStream out(&content, QIODevice::WriteOnly);
-    const bool isWritten = writeCacheFile(out);
-    sCompressionMode = before;
-    return isWritten ? content : QByteArray();
+    return write(out, mode) ? content : QByteArray();
 }
 
 }  // namespace Kdd

@@ -1,0 +1,20 @@
+#pragma once
+
+#include <QString>
+
+#include <functional>
+
+namespace Kdd
+{
+
+/// One attempt to delete the file at a path: 0 when there is none any more, else the errno that tells why there is.
+using RemovalAttempt = std::function<int(const QString& path)>;
+
+/// Takes the lock of a tag file without waiting and deletes it with its journal.
+int removeTagFileOnce(const QString& path);
+
+/// Attempts to delete a tag file, and when that fails five times more, 10 ms apart. Whether it is gone; logs what took
+/// more than one attempt.
+bool removeTagFile(const QString& path, const RemovalAttempt& attempt = removeTagFileOnce);
+
+}  // namespace Kdd

@@ -1,0 +1,40 @@
+#include <QProcess>
+#include <QRegularExpression>
+#include <QStringList>
+
+#include <gtest/gtest.h>
+
+namespace
+{
+
+const char* const kFunctions =
+    "CloseStream ConfigureLogging CreateUserInfo DeleteImagesInTagFile DeleteObject DeleteSeriesInTagFile "
+    "DeleteTagFile DeleteUserInfo FreeTagFileData GetVideoMetaInfo OpenStream OpenStreamRange "
+    "ReadAndSyncTagFileData ReadBytes ReadDicomFromUrl StreamContentLength StringIsUrl UpdateTagFile "
+    "UpdateTagFileW";
+
+/// What the shared library offers, with C++ names as they stand in the source.
+QStringList exports()
+{
+    QProcess nm;
+    nm.start(QStringLiteral("nm"), {QStringLiteral("-DC"), QStringLiteral("--defined-only"),
+                                    QStringLiteral("--format=posix"), QStringLiteral(KDD_LIBRARY)});
+    EXPECT_TRUE(nm.waitForFinished() && nm.exitCode() == 0) << nm.readAllStandardError().constData();
+    return QString::fromUtf8(nm.readAllStandardOutput()).split(QLatin1Char('\n'), Qt::SkipEmptyParts);
+}
+
+TEST(Exports, AreTheFunctionsOfTheCInterfaceAndClassesOfOurs)
+{
+    const QRegularExpression ours(
+        QStringLiteral("^((typeinfo|typeinfo name|vtable|VTT|guard variable|"
+                       "(non-)?virtual thunk) (for|to) )?(Kdd|Kxg)::|^qx(Unc|C)ompress\\("));
+    QStringList functions;
+    for (const QString& line : exports()) {
+        if (!line.contains(ours))
+            functions.append(line.section(QLatin1Char(' '), 0, 0));
+    }
+    functions.sort();
+    EXPECT_EQ(functions.join(QLatin1Char(' ')).toStdString(), kFunctions);
+}
+
+}  // namespace

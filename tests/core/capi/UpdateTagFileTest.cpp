@@ -1,0 +1,105 @@
+#include "CatalogueFixture.h"
+#include "kddlib/capi/kddtagfile.h"
+#include "platform/filecache/ExFileCache.h"
+#include "platform/os/ExclusiveFile.h"
+#include "support/LogCapture.h"
+
+#include <QFile>
+
+#include <gtest/gtest.h>
+
+namespace Kdd
+{
+namespace
+{
+
+const char* const kJob = "<Job><Timestamp>20240131120000</Timestamp><Login>anna</Login><Substitutions>"
+                         "<Tag Group=\"0010\" Element=\"0010\"><Value>Doe^Jane</Value></Tag>"
+                         "</Substitutions></Job>";
+const wchar_t* const kWideJob =
+    L"<Job><Substitutions><Tag Group=\"0008\" Element=\"103E\"><Value>caf\u00e9</Value>"
+    L"</Tag></Substitutions></Job>";
+
+/// A study of two images, and a file cache with three entries.
+class UpdateTagFileTest : public CatalogueFixture
+{
+protected:
+    UpdateTagFileTest()
+    {
+        writeStudy("1.2", {"1", "2"});
+        qputenv("KDD_FILE_CACHE", mStore.filePath("cache").toLocal8Bit());
+        EXPECT_TRUE(cache.init().good());
+        for (const char* name : {"1.2/Level0", "1.2/Level1", "other/Level1"})
+            EXPECT_TRUE(cache.storeBuffer(name, "x").good());
+    }
+    ~UpdateTagFileTest() override { qunsetenv("KDD_FILE_CACHE"); }
+
+    static QByteArray textOf(const char* image, const DcmTagKey& key)
+    {
+        TagFile file;
+        QByteArray text;
+        EXPECT_TRUE(file.readCacheFileForStudy("1.2", false));
+        file.findImage(image)->findAndGetString(key, text);
+        return text;
+    }
+
+    bool isCached(const char* name) const
+    {
+        QByteArray bytes;
+        return cache.readBuffer(name, bytes);
+    }
+
+    ExFileCache cache;
+    const char* images[2] = {"1", "unknown"};
+    const char* entries[2] = {"1.2/Level0", "1.2/Level1"};
+};
+
+TEST_F(UpdateTagFileTest, CorrectsTheImagesNamedAndDropsWhatWasComputedFromThem)
+{
+    ASSERT_TRUE(UpdateTagFile(kJob, "1.2", 2, images, entries));
+    EXPECT_EQ(textOf("1", DCM_PatientName), "Doe^Jane");
+    EXPECT_NE(textOf("2", DCM_PatientName), "Doe^Jane");
+    EXPECT_TRUE(isCached("1.2/Level0") && isCached("other/Level1"));
+    EXPECT_FALSE(isCached("1.2/Level1"));
+    EXPECT_TRUE(UpdateTagFile(kJob, "1.2", 2, images, nullptr)) << "without cache entries";
+}
+
+TEST_F(UpdateTagFileTest, TakesWideTexts)
+{
+    const wchar_t* wideImages[] = {L"2"};
+    const wchar_t* wideEntries[] = {L"1.2/Level1"};
+    ASSERT_TRUE(UpdateTagFileW(kWideJob, L"1.2", 1, wideImages, wideEntries));
+    EXPECT_EQ(textOf("2", DCM_SeriesDescription), "caf\xe9");
+    EXPECT_FALSE(isCached("1.2/Level1"));
+    EXPECT_TRUE(UpdateTagFileW(kWideJob, L"1.2", 1, wideImages, nullptr));
+}
+
+TEST_F(UpdateTagFileTest, SaysInALineWhatWentWrong)
+{
+    QFile held;
+    ASSERT_TRUE(openLockedFile(held, TagFile::cacheFilePathForStudy("1.2"), FileLock::Exclusive,
+                               IfAbsent::Fail, {1, 0}));
+    const LogCapture log;
+    EXPECT_FALSE(UpdateTagFile("<Job>", "1.2", 2, images, entries));
+    EXPECT_EQ(log.count("Error reading UPQ job XML: "), 1);
+    EXPECT_FALSE(UpdateTagFile(kJob, "1.2", 2, images, entries));
+    EXPECT_EQ(log.count("Error updating tag file: "), 1);
+    EXPECT_TRUE(isCached("1.2/Level1"));
+}
+
+TEST_F(UpdateTagFileTest, RefusesNullsAndNegativeCountsWithALineEach)
+{
+    const char* withNull[] = {"1", nullptr};
+    const wchar_t* wideWithNull[] = {L"1", nullptr};
+    const LogCapture log;
+    EXPECT_FALSE(UpdateTagFile(kJob, "1.2", 2, images, withNull));
+    EXPECT_FALSE(UpdateTagFileW(nullptr, L"1.2", 2, wideWithNull, nullptr));
+    EXPECT_FALSE(UpdateTagFileW(kWideJob, nullptr, 2, wideWithNull, nullptr));
+    EXPECT_FALSE(UpdateTagFileW(kWideJob, L"1.2", -1, wideWithNull, nullptr));
+    EXPECT_FALSE(UpdateTagFileW(kWideJob, L"1.2", 2, nullptr, nullptr));
+    EXPECT_FALSE(UpdateTagFileW(kWideJob, L"1.2", 2, wideWithNull, nullptr));
+    EXPECT_EQ(log.count(" must not be "), 6);
+}
+
+}  // namespace
+}  // namespace Kdd
