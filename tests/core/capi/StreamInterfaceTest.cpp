@@ -1,5 +1,4 @@
 #include "kddlib/capi/kddstream.h"
-#include "kddlib/net/KxCurlClient.h"
 #include "support/HttpServer.h"
 #include "support/LogCapture.h"
 #include "support/ObjectServer.h"
@@ -125,7 +124,8 @@ TEST_F(StreamInterface, ATransferThatBreaksOffIsNoWholeObject)
 
 TEST_F(StreamInterface, AfterAnOpeningThatFailsNothingOfAnEarlierObjectFollows)
 {
-    KxCurlClient::instance().setAuthorization([]() -> std::string { throw std::runtime_error("no token"); });
+    // Curl refuses an address of this length, which is thrown.
+    const std::string tooLong = server.url(std::string(8'000'001, 'x'));
     void* const info = CreateUserInfo();
     uint32_t length = 0, isLast = 0;
     const char* data = nullptr;
@@ -133,11 +133,10 @@ TEST_F(StreamInterface, AfterAnOpeningThatFailsNothingOfAnEarlierObjectFollows)
         << "before the first";
     EXPECT_EQ(ReadDicomFromUrl(server.url("object").c_str(), info, &length, &data, 1, &isLast), KDD_READ);
     const LogCapture log;
-    EXPECT_EQ(readDicom("gs://bucket/object", info), "(failed)");
-    EXPECT_EQ(log.count("ReadDicomFromUrl: no token"), 1);
+    EXPECT_EQ(readDicom(tooLong, info), "(failed)");
+    EXPECT_EQ(log.count("ReadDicomFromUrl: Error code: "), 1);
     EXPECT_EQ(ReadDicomFromUrl(nullptr, info, &length, &data, 0, &isLast), KDD_NOT_READ);
     DeleteUserInfo(info);
-    KxCurlClient::instance().setAuthorization({});
 }
 
 TEST_F(StreamInterface, NullsAndNegativeNumbersAreRefusedWithALineEach)
