@@ -145,6 +145,33 @@ TEST_P(LaterRange, FailsTheTransferWithoutAByteThatIsNotTheObjects)
 INSTANTIATE_TEST_SUITE_P(Net, LaterRange, testing::ValuesIn(kLaterFaults),
                          [](const auto& fault) { return fault.param.name; });
 
+TEST_F(Download, NeverGivesAWrongByteWhateverFaultsComeTogether)
+{
+    const QByteArray object = someObject(50'000);
+    std::minstd_rand random(7);
+    std::mutex mutex;
+    const ObjectServer server(object, [&](ObjectServer::Answer& answer) {
+        const std::lock_guard lock(mutex);
+        if (random() % 20 == 0)
+            kLaterFaults[random() % std::size(kLaterFaults)].spoil(answer);
+        // Of a part that a server calls the whole nobody can tell that it is none.
+        if (answer.first == 0 && answer.code == 200)
+            answer.code = 500;
+    });
+    int complete = 0;
+    for (int run = 0; run < 200; ++run) {
+        fetchInRanges(2 + run % 6, 1500 + 100 * run);
+        KxCurlDownloadStream stream = client.read(server.url(), true);
+        const QByteArray got = readAll(stream);
+        const KxHttpStatus status = stream.httpStatus();
+        EXPECT_EQ(status.ok(), got == object) << run;
+        EXPECT_TRUE(object.startsWith(got) || status.code / 100 != 2) << run;
+        complete += status.ok() ? 1 : 0;
+    }
+    EXPECT_GT(complete, 20);
+    EXPECT_LT(complete, 180);
+}
+
 TEST_F(Download, FetchesAnewInOnePieceWhatHasNoKnownLength)
 {
     const QByteArray object = someObject(20'000);
