@@ -35,6 +35,7 @@ public:
     {
     }
 
+    std::string origin() const { return mServer.url(""); }
     std::string url() const { return mServer.url("object"); }
     std::vector<QByteArray> requests() const { return mServer.requests(); }
 

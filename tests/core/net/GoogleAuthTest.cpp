@@ -1,19 +1,24 @@
 #include "kddlib/net/KxCurlClient.h"
 #include "kddlib/net/KxCurlUploadStream.h"
 #include "kddlib/net/KxGoogleAuth.h"
+#include "kddlib/net/KxHttpStatus.h"
 #include "support/CloudStore.h"
 #include "support/LogCapture.h"
+#include "support/ObjectServer.h"
 
 #include <QFile>
 #include <QFileInfo>
 #include <QJsonDocument>
 #include <QJsonObject>
 #include <QProcess>
+#include <QSet>
 #include <QTemporaryDir>
 #include <QTemporaryFile>
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+
+#include <atomic>
 
 using namespace Kdd;
 
@@ -308,6 +313,30 @@ TEST(CloudClient, AuthorizesWhatItUploadsAndDeletes)
     EXPECT_EQ(tokens.requests().size(), 1U);
     for (const char* address : {"https://a/b", "gs://b", "gs://b/", "gs:"})
         EXPECT_THROW(client.write(address), std::invalid_argument) << address;
+}
+
+TEST(CloudClient, AuthorizesEachRangeByTheTokenOfItsTime)
+{
+    std::atomic<int> count{0};
+    const ScriptedServer tokens([&](const QByteArray&) -> ScriptedServer::Reply {
+        return {"HTTP/1.1 200 OK\r\n\r\n{\"access_token\":\"t" + QByteArray::number(++count) +
+                "\",\"token_type\":\"Bearer\",\"expires_in\":0}"};
+    });
+    const ObjectServer store(someObject(8000));
+    qputenv("KDD_CLOUD_DOWNLOAD", store.origin().c_str());
+    KxCurlClient& client = KxCurlClient::instance();
+    client.setGoogleAuthentication(account().key(tokens.url("")));
+    client.setNumConcurrentRequestsPerFile(2);
+    client.setChunkSizeForPartialRequests(2000);
+    KxHttpStatus status;
+    EXPECT_EQ(client.readBytes("gs://b/x", status), someObject(8000));
+    qunsetenv("KDD_CLOUD_DOWNLOAD");
+    client.setNumConcurrentRequestsPerFile(1);
+    QSet<QByteArray> lines;
+    for (const QByteArray& request : store.requests())
+        lines.insert(request.mid(request.indexOf("\r\nAuthorization: ") + 2, 26));
+    EXPECT_EQ(lines.size(), 4);
+    EXPECT_FALSE(lines.contains(""));
 }
 
 }  // namespace

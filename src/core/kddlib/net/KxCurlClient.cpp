@@ -126,9 +126,15 @@ KxCurlDownloadStream KxCurlClient::Private::get(const std::string& url, std::vec
                                                 std::optional<ByteRange> firstRange) const
 {
     KxCurlDownloadRequest::Origin origin;
-    origin.prepare = [this, url, headers = std::move(headers)] {
+    const auto prepare = [this, url, headers = std::move(headers)] {
         return prepareRequest(url, headers, RequestBody::None, currentSettings());
     };
+    // What is to be had without authorisation must not ask for it, in vain, with every range.
+    const PreparedRequest first = prepare();
+    if (isAuthorised(first))
+        origin.prepare = prepare;
+    else
+        origin.prepare = [first] { return first; };
     return open(std::move(origin), firstRange);
 }
 

@@ -2,6 +2,9 @@
 
 #include "kddlib/net/RequestAddress.h"
 
+#include <QByteArray>
+
+#include <algorithm>
 #include <utility>
 
 namespace Kdd
@@ -21,6 +24,13 @@ std::string authorizationHeader(const ClientSettings& settings)
 std::vector<std::string> cloudHeaders(const std::string& authorization)
 {
     return {authorization, "Host: " + cloudApiHost(), "Cache-Control: no-transform"};
+}
+
+bool isAuthorised(const PreparedRequest& request)
+{
+    return std::any_of(request.headers.begin(), request.headers.end(), [](const std::string& line) {
+        return qstrnicmp(line.c_str(), "authorization:", 14) == 0;
+    });
 }
 
 PreparedRequest prepareRequest(const std::string& address, std::vector<std::string> headers, RequestBody body,

@@ -37,6 +37,9 @@ enum class RequestBody { None, Sent };
 PreparedRequest prepareRequest(const std::string& address, std::vector<std::string> headers, RequestBody body,
                                const ClientSettings& settings);
 
+/// Whether it carries an authorisation.
+bool isAuthorised(const PreparedRequest& request);
+
 /// What the settings' authorisation gives; empty without one.
 std::string authorizationHeader(const ClientSettings& settings);
 
