@@ -1,5 +1,6 @@
 #include "kddlib/net/KxCurlClient.h"
 #include "kddlib/net/KxCurlUploadStream.h"
+#include "kddlib/net/UploadErrors.h"
 #include "platform/base/LogFile.h"
 #include "tools/kdd/Commands.h"
 #include "tools/kdd/Database.h"
@@ -44,7 +45,7 @@ Result upload(QFile& file, const QByteArray& url, Progress& progress)
     } catch (const std::invalid_argument&) {
         throw;
     } catch (const std::exception& fault) {
-        return Result::failure(QString::fromUtf8(fault.what()));
+        return Result::failure(QString::fromStdString(explained(fault)));
     }
 }
 

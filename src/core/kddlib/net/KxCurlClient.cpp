@@ -130,11 +130,11 @@ KxCurlDownloadStream KxCurlClient::Private::get(const std::string& url, std::vec
         return prepareRequest(url, headers, RequestBody::None, currentSettings());
     };
     // What is to be had without authorisation must not ask for it, in vain, with every range.
-    const PreparedRequest first = prepare();
+    PreparedRequest first = prepare();
     if (isAuthorised(first))
         origin.prepare = prepare;
     else
-        origin.prepare = [first] { return first; };
+        origin.prepare = [first = std::move(first)] { return PreparedRequest(first); };
     return open(std::move(origin), firstRange);
 }
 

@@ -39,11 +39,6 @@ std::string contentLength(int length)
     return "Content-Length: " + std::to_string(length);
 }
 
-void warnOfCode(int code, const char* step)
-{
-    LogFile::warnf("HTTP code %d while %s resumable upload", code, step);
-}
-
 }  // namespace
 
 KxCurlUploadSession::KxCurlUploadSession(std::shared_ptr<KxCurlHandleFactory> factory, const CurlShare& share,
@@ -69,13 +64,14 @@ void KxCurlUploadSession::start()
                 throw UnrecoverableResponseError("The cloud storage does not name the upload session");
             if (code == kCreated)
                 return;
-            warnOfCode(code, "starting");
+            takeCode(code, "starting");
         } catch (const CurlError& error) {
+            mLastFault = error.what();
             LogFile::warnf("Curl error while starting resumable upload: %s", error.what());
         }
         pause(policy);
     }
-    throw RetryPolicyExhaustedError(kChunkExhausted);
+    throw RetryPolicyExhaustedError(kChunkExhausted, mLastFault);
 }
 
 void KxCurlUploadSession::uploadChunk(const QByteArray& data, Chunk kind)
@@ -90,7 +86,7 @@ void KxCurlUploadSession::uploadChunk(const QByteArray& data, Chunk kind)
     int shortWrites = 0;
     while (!isDone()) {
         if (policy.exhausted())
-            throw RetryPolicyExhaustedError(kChunkExhausted);
+            throw RetryPolicyExhaustedError(kChunkExhausted, mLastFault);
         // What the storage has of the chunk is skipped; the rest is sent from where it lies.
         const quint64 before = mNextOffset;
         const auto left = static_cast<int>(end - before);
@@ -116,8 +112,9 @@ KxCurlUploadSession::Attempt KxCurlUploadSession::tryChunk(const QByteArray& res
     try {
         const int code = exchange("PUT", mSessionUrl, {contentLength(rest.size()), range}, rest);
         if (code != kResumeIncomplete && !mIsComplete)
-            warnOfCode(code, "continuing");
+            takeCode(code, "continuing");
     } catch (const CurlError& error) {
+        mLastFault = error.what();
         LogFile::errorf("Recevied curl error: %s", error.what());
         return Attempt::Failed;
     }
@@ -136,13 +133,22 @@ void KxCurlUploadSession::reset(RetryPolicy& policy)
             const int code = exchange("PUT", mSessionUrl, {contentLength(0), "Content-Range: bytes */*"});
             if (code == kResumeIncomplete || mIsComplete)
                 return;
-            warnOfCode(code, "resetting");
+            takeCode(code, "resetting");
         } catch (const CurlError& error) {
+            mLastFault = error.what();
             LogFile::warnf("Curl error while resetting resumable upload: %s", error.what());
         }
         pause(policy);
     }
-    throw RetryPolicyExhaustedError("Retry policy exhausted in KxCurlUploadSession::resetSession().");
+    throw RetryPolicyExhaustedError("Retry policy exhausted in KxCurlUploadSession::resetSession().",
+                                    mLastFault);
+}
+
+/// An answer that brings the step no further.
+void KxCurlUploadSession::takeCode(int code, const char* step)
+{
+    mLastFault = "HTTP code " + std::to_string(code);
+    LogFile::warnf("HTTP code %d while %s resumable upload", code, step);
 }
 
 void KxCurlUploadSession::pause(RetryPolicy& policy) const

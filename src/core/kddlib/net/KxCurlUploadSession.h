@@ -62,6 +62,7 @@ private:
     void start();
     Attempt tryChunk(const QByteArray& rest, Chunk kind);
     void reset(RetryPolicy& policy);
+    void takeCode(int code, const char* step);
     void pause(RetryPolicy& policy) const;
 
     int exchange(const std::string& method, const std::string& url, const std::vector<std::string>& headers,
@@ -81,6 +82,7 @@ private:
     quint64 mSentEnd = 0;           // behind the last byte that was ever on its way
     std::optional<quint64> mTotal;  // known from the last chunk on
     UploadChecksums mChecksums;
+    std::string mLastFault;  // of a step that is tried again
     bool mIsComplete = false;
 };
 

@@ -1,5 +1,6 @@
 #include "kddlib/net/KxCurlUploadStreambuf.h"
 
+#include "kddlib/net/UploadErrors.h"
 #include "platform/base/LogFile.h"
 
 #include <cstring>
@@ -27,7 +28,7 @@ bool KxCurlUploadStreambuf::guard(const char* step, Step work)
         work();
         return true;
     } catch (const std::exception& fault) {
-        mError = fault.what();
+        mError = explained(fault);
         LogFile::warnf("Got exception while trying to %s. Aborting.\n%s", step, fault.what());
         return false;
     }
