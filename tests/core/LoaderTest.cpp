@@ -42,6 +42,13 @@ protected:
         ASSERT_TRUE(format.saveFile(path(name).constData(), EXS_LittleEndianExplicit).good());
     }
 
+    int sizeOf(const char* name) const
+    {
+        return static_cast<int>(QFile(QString::fromLocal8Bit(path(name))).size());
+    }
+
+    std::shared_ptr<Item> load(const char* name) { return loader.loadMetaData(path(name).constData()); }
+
     static std::string nameIn(const std::shared_ptr<Item>& item)
     {
         OFString name;
@@ -59,11 +66,10 @@ TEST_F(LoaderTest, TheTagFileAnswersAndTheFileIsReadForAllElse)
     add("1", "1_0.dcm");
     ASSERT_TRUE(file->writeCacheFile());
     save(anImage("2").with(DCM_PatientName, "of^file"), "2_0.dcm");
-    const std::shared_ptr<Item> cached = loader.loadMetaData(path("1_0.dcm").constData());
+    const std::shared_ptr<Item> cached = load("1_0.dcm");
     EXPECT_EQ(nameIn(cached), "of^cache");
-    EXPECT_EQ(nameIn(loader.loadMetaData(path("1_7.dcm").constData())), "nothing")
-        << "another file of the image";
-    EXPECT_EQ(nameIn(loader.loadMetaData(path("2_0.dcm").constData())), "of^file");
+    EXPECT_EQ(nameIn(load("1_7.dcm")), "nothing") << "another file of the image";
+    EXPECT_EQ(nameIn(load("2_0.dcm")), "of^file");
     loader.clear();
     ASSERT_NE(cached->obtainDcmDataset(), nullptr) << "the item outlives what the loader kept";
     OFString name;
@@ -89,10 +95,10 @@ TEST_F(LoaderTest, AMissingTagFileIsLookedForOnce)
     save(anImage("1"), "1_0.dcm");
     const LogCapture log;
     for (int i = 0; i < 3; ++i)
-        EXPECT_NE(loader.loadMetaData(path("1_0.dcm").constData()), nullptr);
+        EXPECT_NE(load("1_0.dcm"), nullptr);
     EXPECT_EQ(log.count("No tag file found for study 1.2"), 1);
     loader.clear();
-    loader.loadMetaData(path("1_0.dcm").constData());
+    load("1_0.dcm");
     EXPECT_EQ(log.count("No tag file found for study 1.2"), 2);
 }
 
@@ -100,18 +106,16 @@ TEST_F(LoaderTest, OfPathsThatNameNoImageTheFileIsRead)
 {
     save(anImage("1").with(DCM_PatientName, "of^file"), "1_0.DCM");
     const LogCapture log;
-    EXPECT_EQ(nameIn(loader.loadMetaData(path("1_0.DCM").constData())), "of^file");
+    EXPECT_EQ(nameIn(load("1_0.DCM")), "of^file");
     EXPECT_TRUE(log.lines().empty());
-    EXPECT_EQ(loader.loadMetaData(path("gone.DCM").constData()), nullptr);
+    EXPECT_EQ(load("gone.DCM"), nullptr);
     EXPECT_EQ(log.count("Could not load " + path("gone.DCM").toStdString()), 1);
 }
 
 TEST_F(LoaderTest, TheBeginningOfAFileIsRead)
 {
     save(anImage("1").with(DCM_PatientName, "of^file").withLong(DCM_TextValue, 2000), "1");
-    QFile whole(QString::fromLocal8Bit(path("1")));
-    ASSERT_TRUE(whole.open(QIODevice::ReadOnly));
-    const int size = static_cast<int>(whole.size());
+    const int size = sizeOf("1");
     const LogCapture log;
     EXPECT_EQ(nameIn(loader.loadDcmDataset(path("1").constData(), size)), "of^file");
     EXPECT_EQ(loader.loadDcmDataset(path("1").constData(), size + 1), nullptr);
@@ -131,25 +135,21 @@ TEST_F(LoaderTest, ABeginningThatNestsTooDeepIsRefused)
     for (int depth = 0; depth < 300; ++depth)
         item = anItem().withItem(DCM_ContentSequence, item);
     save(image.withItem(DCM_ContentSequence, item), "deep");
-    const int size = static_cast<int>(QFile(QString::fromLocal8Bit(path("deep"))).size());
     const LogCapture log;
-    EXPECT_EQ(loader.loadDcmDataset(path("deep").constData(), size), nullptr);
+    EXPECT_EQ(loader.loadDcmDataset(path("deep").constData(), sizeOf("deep")), nullptr);
     EXPECT_EQ(log.count("nested too deep"), 1);
 }
 
-struct VolumeRequest
+TEST_F(LoaderTest, VolumesAreFoundByTheNamesOfTheirFiles)
 {
-    const char* name;
-    int index;  // -1: none
-    const char* message;
-};
-
-class LoaderVolumes : public LoaderTest, public testing::WithParamInterface<VolumeRequest>
-{
-};
-
-TEST_P(LoaderVolumes, AreFoundByTheNamesOfTheirFiles)
-{
+    const std::tuple<const char*, int, const char*> cases[] = {
+        {"/a_part7/1.2.3-volume.vol", 0, "-"},
+        {"1.2.3-volume_part002.vol", 1, "-"},
+        {"vol_part0.dcm", -1, "Illegal volume index. Cannot load volume from tag file."},
+        {"1-volume_part004.vol", -1, "Illegal volume index."},
+        {"1-volume_part003.vol", -1, "No filename suffix. Cannot load volume from tag file."},
+        {"1-other.vol", -1, "Filename suffix does not match."},
+    };
     add("1", "1_0.dcm");
     TagMap* series = file->findSeries("1.2.3");
     for (const char* suffix : {"volume", "volume_2", ""}) {
@@ -157,22 +157,14 @@ TEST_P(LoaderVolumes, AreFoundByTheNamesOfTheirFiles)
         series->volumes().last()->setFileNameSuffix(suffix);
     }
     loader.addTagFile("1.2", file);
-    const LogCapture log;
-    Volume* const found = loader.loadVolume(GetParam().name, "1.2.3", "1.2");
-    EXPECT_EQ(found, GetParam().index < 0 ? nullptr : series->volumes().at(GetParam().index));
-    EXPECT_EQ(log.count(GetParam().message), GetParam().index < 0 ? 1 : 0);
-    EXPECT_EQ(loader.loadVolume(GetParam().name, "9", "1.2"), nullptr);
-    EXPECT_EQ(loader.loadVolume(GetParam().name, "1.2.3", ""), nullptr);
+    for (const auto& [name, index, message] : cases) {
+        const LogCapture log;
+        EXPECT_EQ(loader.loadVolume(name, "1.2.3", "1.2"), index < 0 ? nullptr : series->volumes().at(index));
+        EXPECT_EQ(log.count(message), index < 0 ? 1 : 0) << name;
+        EXPECT_EQ(loader.loadVolume(name, "9", "1.2"), nullptr);
+        EXPECT_EQ(loader.loadVolume(name, "1.2.3", ""), nullptr);
+    }
 }
-
-INSTANTIATE_TEST_SUITE_P(
-    Names, LoaderVolumes,
-    testing::Values(
-        VolumeRequest{"/a_part7/1.2.3-volume.vol", 0, "-"}, VolumeRequest{"1.2.3-volume_part002.vol", 1, "-"},
-        VolumeRequest{"vol_part0.dcm", -1, "Illegal volume index. Cannot load volume from tag file."},
-        VolumeRequest{"1-volume_part004.vol", -1, "Illegal volume index."},
-        VolumeRequest{"1-volume_part003.vol", -1, "No filename suffix. Cannot load volume from tag file."},
-        VolumeRequest{"1-other.vol", -1, "Filename suffix does not match."}));
 
 }  // namespace
 }  // namespace Kdd

@@ -9,8 +9,10 @@ namespace Kdd
 
 LogCapture::LogCapture()
 {
-    LogFile::setCallback(
-        [this](LogFile::Severity, const char*, const std::string& line) { mLines.push_back(line); });
+    LogFile::setCallback([this](LogFile::Severity, const char*, const std::string& line) {
+        const std::lock_guard lock(mMutex);
+        mLines.push_back(line);
+    });
 }
 
 LogCapture::~LogCapture()

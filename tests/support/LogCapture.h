@@ -1,12 +1,13 @@
 #pragma once
 
+#include <mutex>
 #include <string>
 #include <vector>
 
 namespace Kdd
 {
 
-/// Takes every log line while it lives, instead of its being written.
+/// Takes every log line while it lives, instead of its being written. Any thread may write; once they are done, ask.
 class LogCapture
 {
 public:
@@ -21,6 +22,7 @@ public:
     int count(const std::string& text) const;
 
 private:
+    std::mutex mMutex;
     std::vector<std::string> mLines;
 };
 

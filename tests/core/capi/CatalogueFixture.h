@@ -9,8 +9,8 @@
 
 #include <gtest/gtest.h>
 
-#include <initializer_list>
 #include <memory>
+#include <vector>
 
 namespace Kdd
 {
@@ -28,10 +28,10 @@ protected:
     }
 
     /// A tag file with images of one series, which has the study's UID with ".3".
-    static void writeStudy(const QByteArray& study, std::initializer_list<const char*> images)
+    static void writeStudy(const QByteArray& study, const std::vector<QByteArray>& images)
     {
         TagFile file;
-        for (const char* uid : images) {
+        for (const QByteArray& uid : images) {
             const QByteArray series = study + ".3";
             file.addTagMap(anImage(uid).inStudy(study.constData()).inSeries(series.constData()).map(),
                            nullptr, true);
@@ -40,10 +40,10 @@ protected:
     }
 
     /// The same in the database.
-    void registerImages(const QByteArray& study, std::initializer_list<const char*> images)
+    void registerImages(const QByteArray& study, const std::vector<QByteArray>& images)
     {
         Kxg::FileRecords files;
-        for (const char* uid : images) {
+        for (const QByteArray& uid : images) {
             Kxg::DicomFileRecord image;
             image.path = '/' + study + '/' + uid;
             image.studyInstanceUID = study;
@@ -53,6 +53,14 @@ protected:
         }
         QMap<QByteArray, qint64> requests;
         EXPECT_TRUE(mCatalogue->registerFiles(files, requests).good());
+    }
+
+    /// None when there is no such tag file.
+    static QList<QByteArray> imagesInFile(const QByteArray& study)
+    {
+        TagFile file;
+        return file.readCacheFileForStudy(study.constData(), false) ? file.imagesByUID().keys()
+                                                                    : QList<QByteArray>();
     }
 
     TemporaryStore mStore;

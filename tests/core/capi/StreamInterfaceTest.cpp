@@ -31,6 +31,14 @@ QByteArray readDicom(const std::string& url, void* userInfo, int* blocks = nullp
     return content;
 }
 
+/// Asks for the next block of what was read last, or for the first of an object.
+int readBlock(void* userInfo, const char* url = nullptr)
+{
+    uint32_t length = 1, isLast = 1;
+    const char* data = nullptr;
+    return ReadDicomFromUrl(url, userInfo, &length, &data, url != nullptr, &isLast);
+}
+
 class StreamInterface : public testing::Test
 {
 protected:
@@ -47,7 +55,7 @@ protected:
     NginxServer server;
 };
 
-TEST_F(StreamInterface, BlocksComeInOrderUntilTheEnd)
+TEST_F(StreamInterface, BlocksOfTheWholeOrARangeComeInOrderUntilTheEnd)
 {
     void* stream = nullptr;
     ASSERT_EQ(OpenStream(server.url("object").c_str(), &stream), KDD_STREAM_OPENED);
@@ -59,14 +67,9 @@ TEST_F(StreamInterface, BlocksComeInOrderUntilTheEnd)
     EXPECT_EQ(read, object);
     EXPECT_EQ(ReadBytes(stream, read.data(), 0, 1), 0);
     CloseStream(stream);
-}
 
-TEST_F(StreamInterface, ARangeIsThatPart)
-{
-    void* stream = nullptr;
     ASSERT_EQ(OpenStreamRange(server.url("object").c_str(), "500-1499", &stream), KDD_STREAM_OPENED);
     EXPECT_EQ(StreamContentLength(stream), 100000U) << "of the whole";
-    QByteArray read(2000, '\0');
     EXPECT_EQ(ReadBytes(stream, read.data(), 0, 2000), 1000);
     EXPECT_EQ(read.left(1000), object.mid(500, 1000));
     CloseStream(stream);
@@ -114,10 +117,7 @@ TEST_F(StreamInterface, ATransferThatBreaksOffIsNoWholeObject)
     const QByteArray read = readDicom(cut.url("x"), info);
     EXPECT_TRUE((QByteArray(KDD_BLOCK_SIZE, 'x') + "(failed)").endsWith(read)) << read.constData();
     EXPECT_TRUE(read.endsWith("(failed)"));
-    uint32_t length = 1, isLast = 1;
-    const char* data = nullptr;
-    EXPECT_EQ(ReadDicomFromUrl(nullptr, info, &length, &data, 0, &isLast), KDD_NOT_READ)
-        << "nothing more comes";
+    EXPECT_EQ(readBlock(info), KDD_NOT_READ) << "nothing more comes";
     EXPECT_EQ(readDicom(server.url("object"), info), object) << "nor stays";
     DeleteUserInfo(info);
 }
@@ -127,15 +127,12 @@ TEST_F(StreamInterface, AfterAnOpeningThatFailsNothingOfAnEarlierObjectFollows)
     // Curl refuses an address of this length, which is thrown.
     const std::string tooLong = server.url(std::string(8'000'001, 'x'));
     void* const info = CreateUserInfo();
-    uint32_t length = 0, isLast = 0;
-    const char* data = nullptr;
-    EXPECT_EQ(ReadDicomFromUrl(nullptr, info, &length, &data, 0, &isLast), KDD_NOT_READ)
-        << "before the first";
-    EXPECT_EQ(ReadDicomFromUrl(server.url("object").c_str(), info, &length, &data, 1, &isLast), KDD_READ);
+    EXPECT_EQ(readBlock(info), KDD_NOT_READ) << "before the first";
+    EXPECT_EQ(readBlock(info, server.url("object").c_str()), KDD_READ);
     const LogCapture log;
     EXPECT_EQ(readDicom(tooLong, info), "(failed)");
     EXPECT_EQ(log.count("ReadDicomFromUrl: Error code: "), 1);
-    EXPECT_EQ(ReadDicomFromUrl(nullptr, info, &length, &data, 0, &isLast), KDD_NOT_READ);
+    EXPECT_EQ(readBlock(info), KDD_NOT_READ);
     DeleteUserInfo(info);
 }
 

@@ -1,8 +1,8 @@
 #include "CatalogueFixture.h"
 #include "kddlib/capi/kddstream.h"
 #include "kddlib/capi/kddtagfile.h"
-#include "platform/base/LogFile.h"
 #include "support/HttpServer.h"
+#include "support/LogCapture.h"
 #include "support/ObjectServer.h"
 
 #include <QFile>
@@ -60,26 +60,6 @@ TEST(Threads, ReadStreamsAtOnce)
               kThreads * kRounds);
 }
 
-/// Counts the log lines that contain a text, on whichever thread they are written.
-class LineCount
-{
-public:
-    explicit LineCount(const char* text)
-    {
-        LogFile::setCallback([this, text](LogFile::Severity, const char*, const std::string& line) {
-            mCount += line.find(text) != std::string::npos ? 1 : 0;
-        });
-    }
-    ~LineCount() { LogFile::setCallback({}); }
-    LineCount(const LineCount&) = delete;
-    LineCount& operator=(const LineCount&) = delete;
-
-    int count() const { return mCount; }
-
-private:
-    std::atomic<int> mCount = 0;
-};
-
 /// Each thread removes images of its own from the one file or from its own.
 class ThreadsAndTagFiles : public CatalogueFixture
 {
@@ -91,13 +71,12 @@ protected:
 
     static void write(const QByteArray& study, int firstThread, int lastThread)
     {
-        TagFile file;
+        std::vector<QByteArray> images;
         for (int thread = firstThread; thread <= lastThread; ++thread) {
             for (int round = 0; round <= kRounds; ++round)
-                file.addTagMap(anImage(imageOf(thread, round)).inStudy(study.constData()).map(), nullptr,
-                               true);
+                images.push_back(imageOf(thread, round));
         }
-        EXPECT_TRUE(file.writeCacheFile());
+        writeStudy(study, images);
     }
 
     static bool removeImage(const QByteArray& study, int thread, int round)
@@ -116,13 +95,6 @@ protected:
         FreeTagFileData(handle);
         return handle != nullptr && isTagFile;
     }
-
-    static int imagesIn(const QByteArray& study)
-    {
-        TagFile file;
-        EXPECT_TRUE(file.readCacheFileForStudy(study.constData(), false));
-        return file.imagesByUID().size();
-    }
 };
 
 TEST_F(ThreadsAndTagFiles, OfTheirOwnDoNotMeet)
@@ -137,7 +109,7 @@ TEST_F(ThreadsAndTagFiles, OfTheirOwnDoNotMeet)
               }),
               kThreads * kRounds);
     for (int thread = 0; thread < kThreads; ++thread) {
-        EXPECT_EQ(imagesIn(study(thread)), 1);
+        EXPECT_EQ(imagesInFile(study(thread)).size(), 1);
         EXPECT_TRUE(DeleteTagFile(study(thread).constData()));
     }
 }
@@ -148,15 +120,16 @@ TEST_F(ThreadsAndTagFiles, OfOneStudyWaitForEachOther)
     registerImages("1.2", {"kept"});
     // Whoever finds the file held for longer than it waits is told so, and nothing is lost.
     {
-        const LineCount refused("Could not remove images from the tag file of study 1.2");
+        const LogCapture log;
         EXPECT_EQ(runOnAllThreads([](int thread, int round) { return removeImage("1.2", thread, round); }),
                   kThreads * kRounds);
-        EXPECT_EQ(imagesIn("1.2"), kThreads + refused.count());
+        EXPECT_EQ(imagesInFile("1.2").size(),
+                  kThreads + log.count("Could not remove images from the tag file of study 1.2"));
     }
     EXPECT_EQ(runOnAllThreads([this](int, int) { return isSynced("1.2"); }), kThreads * kRounds);
-    const LineCount refused("could not be deleted");
-    EXPECT_EQ(runOnAllThreads([](int, int) { return DeleteTagFile("1.2"); }),
-              kThreads * kRounds - refused.count());
+    const LogCapture log;
+    const int deletions = runOnAllThreads([](int, int) { return DeleteTagFile("1.2"); });
+    EXPECT_EQ(deletions, kThreads * kRounds - log.count("could not be deleted"));
     EXPECT_FALSE(QFile::exists(TagFile::cacheFilePathForStudy("1.2")));
 }
 

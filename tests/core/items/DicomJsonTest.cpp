@@ -13,6 +13,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <array>
 #include <memory>
 #include <random>
 #include <sstream>
@@ -69,35 +70,29 @@ TEST(DicomJson, EqualsThatOfADatasetInUtf8)
     EXPECT_EQ(jsonOf(*map), jsonByDcmtk(image.dataset()));
 }
 
-struct Encoded
-{
-    const char* characterSet;
-    const char* name;
-    const char* shown;  // in UTF-8
-};
-
-const Encoded kEncoded[] = {
-    {"ISO_IR 100", "M\xfcller", "Müller"},
-    {"ISO_IR 144", "\xbb\xee\xda\x63\x65\xdc\xd1\xe3\xe0", "Люкceмбур"},
-    {"ISO_IR 192", "M\xc3\xbcller", "Müller"},
-    {"GB18030", "\xcd\xf5^\xd0\xa1\xb6\xab", "王^小东"},
-    {"\\ISO 2022 IR 87", "Yamada^Tarou=\x1b$B;3ED\x1b(B^\x1b$BB@O:\x1b(B", "Yamada^Tarou=山田^太郎"},
-    {"ISO 2022 IR 13\\ISO 2022 IR 87", "\xd4\xcf\xc0\xde^\xc0\xdb\xb3", "ﾔﾏﾀﾞ^ﾀﾛｳ"},
-    {"\\ISO 2022 IR 149", "Hong^Gildong=\x1b$)C\xfb\xf3^\x1b$)C\xd1\xce\xd4\xd7", "Hong^Gildong=洪^吉洞"},
-    {"ISO_IR 192", "M\xfcller", "Müller"},  // not what it declares
-    {nullptr, "M\xfcller", "Müller"},
-    {nullptr, "M\xc3\xbcller", "Müller"},
-    {"no such set", "M\xfcller", "Müller"},
-    {"ISO_IR 100", "A\\M\xfc", "A\",\"Mü"},
+/// A character set, a name, and how it is shown in UTF-8.
+const std::array<const char*, 3> kEncoded[] = {
+    {{"ISO_IR 100", "M\xfcller", "Müller"}},
+    {{"ISO_IR 144", "\xbb\xee\xda\x63\x65\xdc\xd1\xe3\xe0", "Люкceмбур"}},
+    {{"ISO_IR 192", "M\xc3\xbcller", "Müller"}},
+    {{"GB18030", "\xcd\xf5^\xd0\xa1\xb6\xab", "王^小东"}},
+    {{"\\ISO 2022 IR 87", "Yamada^Tarou=\x1b$B;3ED\x1b(B^\x1b$BB@O:\x1b(B", "Yamada^Tarou=山田^太郎"}},
+    {{"ISO 2022 IR 13\\ISO 2022 IR 87", "\xd4\xcf\xc0\xde^\xc0\xdb\xb3", "ﾔﾏﾀﾞ^ﾀﾛｳ"}},
+    {{"\\ISO 2022 IR 149", "Hong^Gildong=\x1b$)C\xfb\xf3^\x1b$)C\xd1\xce\xd4\xd7", "Hong^Gildong=洪^吉洞"}},
+    {{"ISO_IR 192", "M\xfcller", "Müller"}},  // not what it declares
+    {{nullptr, "M\xfcller", "Müller"}},
+    {{nullptr, "M\xc3\xbcller", "Müller"}},
+    {{"no such set", "M\xfcller", "Müller"}},
+    {{"ISO_IR 100", "A\\M\xfc", "A\",\"Mü"}},
 };
 
 TEST(DicomJson, DecodesTextsByTheirCharacterSet)
 {
-    for (const Encoded& row : kEncoded) {
-        DatasetBuilder image = anImage().with(DCM_StudyDescription, row.name);
-        if (row.characterSet != nullptr)
-            image.with(DCM_SpecificCharacterSet, row.characterSet);
-        EXPECT_THAT(jsonOf(image), holds("00081030", row.shown));
+    for (const auto& [characterSet, name, shown] : kEncoded) {
+        DatasetBuilder image = anImage().with(DCM_StudyDescription, name);
+        if (characterSet != nullptr)
+            image.with(DCM_SpecificCharacterSet, characterSet);
+        EXPECT_THAT(jsonOf(image), holds("00081030", shown));
     }
 }
 
