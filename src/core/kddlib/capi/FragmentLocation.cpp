@@ -1,5 +1,7 @@
 #include "kddlib/capi/FragmentLocation.h"
 
+#include "kddlib/net/DicomParse.h"
+#include "kddlib/net/LocalFileStream.h"
 #include "platform/os/RandomAccessFile.h"
 #include "platform/volume/FragmentReader.h"
 
@@ -9,7 +11,6 @@
 
 #include <dcmtk/dcmdata/dcdeftag.h>
 #include <dcmtk/dcmdata/dcfilefo.h>
-#include <dcmtk/dcmdata/dcistrmf.h>
 #include <dcmtk/dcmdata/dcpixseq.h>
 #include <dcmtk/dcmdata/dcpxitem.h>
 
@@ -23,7 +24,6 @@ namespace
 
 constexpr qint64 kItemHeaderSize = 8;
 constexpr unsigned char kItemTag[] = {0xfe, 0xff, 0x00, 0xe0};
-constexpr Uint32 kMaxReadLength = 4096;
 
 DcmPixelSequence* fragmentsOf(DcmFileFormat& file)
 {
@@ -43,11 +43,13 @@ qint64 lengthOf(DcmPixelSequence& sequence, unsigned long item)
 /// Where the value of Pixel Data begins: the parser tells no positions, but it stops there when it is asked to.
 qint64 positionOfPixelData(const char* path)
 {
-    DcmInputFileStream stream(path);
+    DepthLimited<LocalFileStream> stream(path);
     DcmFileFormat upToPixelData;
-    upToPixelData.transferInit();
-    upToPixelData.readUntilTag(stream, EXS_Unknown, EGL_noChange, kMaxReadLength, DCM_PixelData);
-    upToPixelData.transferEnd();
+    ParseOptions options;
+    options.reader = [&](DcmInputStream& from, Uint32 maxReadLength) {
+        return upToPixelData.readUntilTag(from, EXS_Unknown, EGL_noChange, maxReadLength, DCM_PixelData);
+    };
+    parseDicom(stream, upToPixelData, options);
     return stream.tell();
 }
 

@@ -18,7 +18,6 @@ namespace
 
 constexpr int kDebugFlag = 1;
 constexpr int kTimingsFlag = 2;
-constexpr unsigned int kTimingsOption = 1;
 const char* const kCategory = "kdd";
 
 void configureLogging(int flags, const char* databaseServer)
@@ -29,7 +28,7 @@ void configureLogging(int flags, const char* databaseServer)
     const bool hasTimings = (flags & kTimingsFlag) != 0;
     LogFile::setLevel(LogFile::Level::Everything);
     LogFile::setCallback(isDebug ? LogFile::Callback() : LogFile::Callback(writeToSystemLog));
-    TagFile::setDebugOptions(hasTimings ? kTimingsOption : 0);
+    TagFile::setDebugOptions(hasTimings ? TagFile::kTimings : 0);
     if (isDebug)
         LogFile::printf("Configure logging: debug=%d timings=%d", 1, hasTimings ? 1 : 0);
 }
