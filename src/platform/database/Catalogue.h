@@ -80,6 +80,88 @@ struct FileRecords
     std::vector<OtherFileRecord> others;
 };
 
+/// Two files that name the same image, or an image that is not shown where its file says.
+struct FileConflict
+{
+    enum class Kind {
+        Replaces,           ///< `path` is shown in place of `otherPath`, which was registered before it
+        AlsoInOtherStudy,   ///< `otherStudyUID` shows an image of the same SOP Instance UID, from `otherPath`
+        FollowsCorrection,  ///< a correction moved the image to `otherStudyUID`, and the file goes there
+    };
+
+    Kind kind = Kind::Replaces;
+    QByteArray path;
+    QByteArray sopInstanceUID;
+    QByteArray
+        studyInstanceUID;  ///< in which `path` is registered; of one that follows, the one that it names itself
+    QByteArray otherPath;
+    QByteArray otherStudyUID;
+};
+
+/// What became of files that were registered.
+struct RegistrationOutcome
+{
+    /// The request left for each study touched, by Study Instance UID. A study that lost its last file has one too: its
+    /// tag file has to go.
+    QMap<QByteArray, qint64> requests;
+    std::vector<FileConflict> conflicts;
+};
+
+/// A correction of one stored image: what its study shows of it in place of what its DICOM file says. An image has one,
+/// which holds all that was ever corrected.
+struct ImageCorrection
+{
+    QByteArray studyInstanceUID;  ///< as the DICOM file has it
+    QByteArray image;             ///< its SOP Instance UID likewise, or the file's path where it has none
+
+    QByteArray shownStudyUID;  ///< where the image stands now
+    QByteArray shownSeriesUID;
+    QByteArray shownImage;  ///< its SOP Instance UID now, or the path
+
+    /// The attributes that are replaced, as whoever corrects encodes them. Empty: there is no correction any more.
+    QByteArray changes;
+};
+
+/// A tag file as it was written last: the bytes that count, and their digest. An empty digest: never written.
+struct TagFileStamp
+{
+    qint64 size = 0;  ///< [bytes]
+    QByteArray digest;
+
+    bool operator==(const TagFileStamp& other) const { return size == other.size && digest == other.digest; }
+};
+
+/// An image of a study: of several files of one SOP Instance UID the one registered last.
+struct ListedImage
+{
+    QByteArray path;
+    QByteArray seriesInstanceUID;
+    QByteArray sopInstanceUID;  ///< as it is shown; empty where the file has none
+};
+
+/// All that the catalogue has of one study.
+struct StudyContents
+{
+    std::vector<ListedImage> images;  ///< by path
+    QVector<QByteArray> volumes;  ///< volume files, by path, those that a correction brought along included
+    bool isCorrected = false;     ///< a correction concerns an image that is or was in the study
+    TagFileStamp tagFile;
+};
+
+/// A study whose tag file was brought into line with the catalogue.
+struct BuiltStudy
+{
+    TagFileStamp tagFile;
+
+    /// An image of each series, corrections included, from which the series' attributes are taken; of the first one
+    /// also those of the study.
+    std::vector<DicomFileRecord> series;
+
+    /// When the tag file is to be built once more although nothing changed [ms since the epoch]; 0: not at all. Until
+    /// then the study does not wait.
+    qint64 settleAt = 0;
+};
+
 /// A line of the list of studies.
 struct StudySummary
 {
@@ -90,7 +172,7 @@ struct StudySummary
     QByteArray studyDate;
     QByteArray modalities;  ///< distinct, sorted, separated by a blank
     int series = 0;
-    int images = 0;
+    int images = 0;  ///< not files: several files of one image are one
     int volumes = 0;
     bool isWaiting = false;  ///< something changed since its tag file was built
 };
@@ -111,6 +193,12 @@ public:
     /// meanwhile stay.
     virtual Kdd::Result finish() = 0;
 
+    /// The same, and keeps what the study now shows of itself and by what its tag file is recognised.
+    virtual Kdd::Result finish(const BuiltStudy& built) = 0;
+
+    /// The same for a study that has neither files nor a tag file any more: forgets it, unless it got files meanwhile.
+    virtual Kdd::Result finishRemoved() = 0;
+
 protected:
     StudyClaim() = default;
 };
@@ -119,8 +207,12 @@ protected:
 /// built, configuration.
 ///
 /// The queue holds requests. Every transaction that registers or removes files leaves one request for each study it
-/// touched; the study waits as long as a request of it is there. Whoever has done the work deletes the requests that he
-/// knows of, so that what is registered while a study is being built makes it wait again.
+/// touched; the study waits as long as a request of it is due. Whoever has done the work deletes the requests that he
+/// knows of, so that what is registered while a study is being built makes it wait again. A study that lost its last
+/// file waits as well, until its tag file is removed and somebody says so; lists do not show it.
+///
+/// Files are listed where their images are shown: under the study, series and SOP Instance UID that a correction gave
+/// them. Of several files of one image in a study the one registered last counts, and the next one when that goes.
 ///
 /// One object is one connection and belongs to the thread that opened it. Every failure leaves the database as it was
 /// and tells why: the database and what it said.
@@ -142,17 +234,35 @@ public:
     /// Registers the files in one transaction, in place of what was known under their paths; `requests` receives the
     /// request left for each study touched, by Study Instance UID. A file that moves from one study to another
     /// touches both. One file that is refused refuses them all.
-    virtual Kdd::Result registerFiles(const FileRecords& files, QMap<QByteArray, qint64>& requests) = 0;
+    Kdd::Result registerFiles(const FileRecords& files, QMap<QByteArray, qint64>& requests);
 
-    /// Forget files; the files themselves stay. Studies and series that become empty go too.
+    /// The same, and tells which files stand in each other's way.
+    virtual Kdd::Result registerFiles(const FileRecords& files, RegistrationOutcome& outcome) = 0;
+
+    /// Forget files; the files themselves stay, and so do corrections: a file that comes back follows them. Series that
+    /// become empty go too; a study that does waits for its tag file to be removed.
     virtual Kdd::Result removeFiles(const QVector<QByteArray>& paths) = 0;
     virtual Kdd::Result removeStudy(const QByteArray& studyUID) = 0;
     virtual Kdd::Result removeSeries(const QByteArray& studyUID, const QByteArray& seriesUID) = 0;
     virtual Kdd::Result removeImage(const QByteArray& studyUID, const QByteArray& sopUID) = 0;
 
+    // ---- corrections
+
+    /// Keeps the corrections in place of earlier ones of the same images, and lists the files of each image where it is
+    /// shown now. `requests` receives a request for each study touched; one that does not exist yet is made.
+    virtual Kdd::Result recordCorrections(const std::vector<ImageCorrection>& corrections,
+                                          QMap<QByteArray, qint64>& requests) = 0;
+
+    /// The corrections of images that are or were in a study.
+    virtual Kdd::Result corrections(const QByteArray& studyUID,
+                                    std::vector<ImageCorrection>& corrections) = 0;
+
     // ---- studies
 
-    /// By UID.
+    /// All that there is of a study, at one moment; nothing of one that does not exist.
+    virtual Kdd::Result studyContents(const QByteArray& studyUID, StudyContents& contents) = 0;
+
+    /// By UID, those that have files.
     virtual Kdd::Result listStudies(std::vector<StudySummary>& studies) = 0;
 
     /// At most `limit` UIDs that begin with `prefix`, in order.
@@ -163,8 +273,13 @@ public:
 
     // ---- the queue
 
-    /// Leaves a request for each of the studies; one that does not exist is a failure that names it.
-    virtual Kdd::Result requestBuild(const QVector<QByteArray>& studyUIDs) = 0;
+    enum class IfGone { Fail, PassOver };
+
+    /// Leaves a request for each of the studies; one that does not exist is a failure that names it, or is passed over.
+    virtual Kdd::Result requestBuild(const QVector<QByteArray>& studyUIDs, IfGone ifGone = IfGone::Fail) = 0;
+
+    /// Makes all requests due that wait for their time.
+    virtual Kdd::Result settleNow() = 0;
 
     /// The UIDs of the studies that wait, claimed ones included, and have files at or below a path; in order.
     virtual Kdd::Result waitingStudies(const QByteArray& path, QVector<QByteArray>& studyUIDs) = 0;
@@ -177,9 +292,10 @@ public:
     virtual Kdd::Result claimNext(const QSet<int>& except, std::unique_ptr<StudyClaim>& claim) = 0;
 
     /// Claims one study, whether it waits or not, and waits up to `patienceMs` [ms] while another holds it. Null in
-    /// `claim` when it is still held then; a study that does not exist is a failure.
-    virtual Kdd::Result claim(const QByteArray& studyUID, int patienceMs,
-                              std::unique_ptr<StudyClaim>& claim) = 0;
+    /// `claim` when it is still held then; a study that does not exist is a failure, or is made without files.
+    enum class IfAbsent { Fail, Create };
+    virtual Kdd::Result claim(const QByteArray& studyUID, int patienceMs, std::unique_ptr<StudyClaim>& claim,
+                              IfAbsent ifAbsent = IfAbsent::Fail) = 0;
 
     /// Deletes requests that are done, whoever left them.
     virtual Kdd::Result finishRequests(const QVector<qint64>& requests) = 0;

@@ -1,7 +1,9 @@
 #include "platform/database/FileRegistration.h"
 
+#include "platform/database/CorrectionRows.h"
 #include "platform/database/SqlConnection.h"
 #include "platform/database/StudyContent.h"
+#include "platform/database/StudyDescription.h"
 
 #include <algorithm>
 
@@ -13,50 +15,6 @@ namespace
 // A server answers a statement for many files in nearly the time of one for a single file. Files that are too few for
 // that are taken one by one, so that there are two texts of each statement and not one for every number of files.
 constexpr int kFilesAtOnce = 100;
-
-struct Attribute
-{
-    const char* column;
-    QByteArray DicomFileRecord::*value;
-};
-
-const Attribute kStudyAttributes[] = {
-    {"patient_name", &DicomFileRecord::patientName},
-    {"patient_id", &DicomFileRecord::patientID},
-    {"patient_birth_date", &DicomFileRecord::patientBirthDate},
-    {"patient_sex", &DicomFileRecord::patientSex},
-    {"study_date", &DicomFileRecord::studyDate},
-    {"study_time", &DicomFileRecord::studyTime},
-    {"study_description", &DicomFileRecord::studyDescription},
-    {"accession_number", &DicomFileRecord::accessionNumber},
-};
-
-const Attribute kSeriesAttributes[] = {
-    {"series_number", &DicomFileRecord::seriesNumber},
-    {"series_description", &DicomFileRecord::seriesDescription},
-    {"modality", &DicomFileRecord::modality},
-    {"series_date", &DicomFileRecord::seriesDate},
-    {"series_time", &DicomFileRecord::seriesTime},
-    {"station_name", &DicomFileRecord::stationName},
-};
-
-template <size_t n>
-QByteArray describing(const char* table, const Attribute (&attributes)[n])
-{
-    QByteArray sql = QByteArray("UPDATE ") + table + " SET is_described = 1";
-    for (const Attribute& attribute : attributes)
-        sql += QByteArray(", ") + attribute.column + " = ?";
-    return sql + " WHERE id = ?";
-}
-
-template <size_t n>
-QVariantList description(const DicomFileRecord& record, const Attribute (&attributes)[n], qint64 id)
-{
-    QVariantList values;
-    for (const Attribute& attribute : attributes)
-        values << textValue(record.*attribute.value);
-    return values << id;
-}
 
 QByteArray repeated(const QByteArray& text, int times)
 {
@@ -72,6 +30,11 @@ struct FileRegistration::Entry
     FileStamp stamp;
     QByteArray studyUID, seriesUID, sopUID;
     const DicomFileRecord* attributes = nullptr;  // null when the file says nothing of its study and series
+    qint64 studyId = 0;
+    QVariant seriesId = QVariant(QVariant::LongLong);  // null for what belongs to none
+    bool isShown = true;
+
+    bool isNamedImage() const { return kind == FileKind::Dicom && !sopUID.isEmpty(); }
 
     void check() const
     {
@@ -106,71 +69,173 @@ std::vector<FileRegistration::Entry> FileRegistration::inOrder(const FileRecords
     return {byPath.cbegin(), byPath.cend()};
 }
 
-void FileRegistration::run(const FileRecords& files, QMap<QByteArray, qint64>& requests)
+void FileRegistration::run(const FileRecords& files, RegistrationOutcome& outcome)
 {
-    const std::vector<Entry> entries = inOrder(files);
+    mOutcome = &outcome;
+    std::vector<Entry> entries = inOrder(files);
+    if (hasCorrections(mConnection))
+        followCorrections(entries);
+    mNumber = takeRegistrationNumbers(mConnection, static_cast<qint64>(entries.size()));
     for (auto from = entries.begin(); from != entries.end();) {
         const auto to = entries.end() - from >= kFilesAtOnce ? from + kFilesAtOnce : from + 1;
         put({from, to});
         from = to;
     }
+    for (const Image& image : qAsConst(mLeft))
+        showNewest(mConnection, image.first, image.second);
     QList<qint64> touched = mTouched.values();
     std::sort(touched.begin(), touched.end());
     for (const qint64 studyId : qAsConst(touched))
-        concludeChange(mConnection, studyId, requests);
+        concludeChange(mConnection, studyId, outcome.requests);
 }
 
-void FileRegistration::put(const std::vector<Entry>& entries)
+/// A file of an image that was corrected belongs where the correction put the image.
+void FileRegistration::followCorrections(std::vector<Entry>& entries)
 {
-    noteFormerStudies(entries);
-    QVariantList values;
-    for (const Entry& entry : entries) {
-        const QVariant series =
-            entry.kind == FileKind::Other ? QVariant(QVariant::LongLong) : obtainSeries(entry);
-        values << bytesValue(entry.path) << entry.stamp.size << entry.stamp.modified
-               << static_cast<int>(entry.kind) << series << textValue(entry.sopUID);
+    QList<QByteArray> images;
+    for (const Entry& entry : entries)
+        images.append(entry.sopUID.isEmpty() ? entry.path : entry.sopUID);
+    QHash<QPair<QByteArray, QByteArray>, ImageCorrection> known;
+    for (const ImageCorrection& correction : correctionsOfImages(mConnection, images))
+        known.insert({correction.studyInstanceUID, correction.image}, correction);
+    for (std::size_t i = 0; i < entries.size(); ++i) {
+        Entry& entry = entries[i];
+        const auto found = known.constFind({entry.studyUID, images.at(static_cast<int>(i))});
+        if (entry.kind != FileKind::Dicom || found == known.cend())
+            continue;
+        if (found->shownStudyUID != entry.studyUID)
+            mOutcome->conflicts.push_back({FileConflict::Kind::FollowsCorrection, entry.path, entry.sopUID,
+                                           entry.studyUID, QByteArray(), found->shownStudyUID});
+        entry.studyUID = found->shownStudyUID;
+        entry.seriesUID = found->shownSeriesUID;
+        if (found->shownImage != entry.path)
+            entry.sopUID = found->shownImage;
     }
+}
+
+void FileRegistration::put(std::vector<Entry> entries)
+{
+    const QHash<QByteArray, Image> former = formerImages(entries);
+    for (Entry& entry : entries) {
+        if (entry.kind != FileKind::Other)
+            place(entry);
+        const Image before = former.value(entry.path);
+        if (before.first != 0 && before != Image(entry.studyId, entry.sopUID))
+            mLeft.insert(before);
+    }
+    settleConflicts(entries);
+    write(entries);
+}
+
+void FileRegistration::write(const std::vector<Entry>& entries)
+{
+    QVariantList values;
+    for (const Entry& entry : entries)
+        values << bytesValue(entry.path) << entry.stamp.size << entry.stamp.modified
+               << static_cast<int>(entry.kind) << entry.seriesId << textValue(entry.sopUID) << mNumber++
+               << (entry.isShown ? 1 : 0);
     mConnection.change(
-        "INSERT INTO file (path, size, modified, kind, series_id, sop_uid) VALUES " +
-            repeated("(?, ?, ?, ?, ?, ?)", static_cast<int>(entries.size())) +
+        "INSERT INTO file (path, size, modified, kind, series_id, sop_uid, registered, is_shown) VALUES " +
+            repeated("(?, ?, ?, ?, ?, ?, ?, ?)", static_cast<int>(entries.size())) +
             " ON CONFLICT (path) DO UPDATE SET size = excluded.size, modified = excluded.modified,"
-            " kind = excluded.kind, series_id = excluded.series_id, sop_uid = excluded.sop_uid",
+            " kind = excluded.kind, series_id = excluded.series_id, sop_uid = excluded.sop_uid,"
+            " registered = excluded.registered, is_shown = excluded.is_shown",
         values);
 }
 
-void FileRegistration::noteFormerStudies(const std::vector<Entry>& entries)
+/// The images that are known under the paths so far.
+QHash<QByteArray, FileRegistration::Image> FileRegistration::formerImages(const std::vector<Entry>& entries)
 {
     QVariantList paths;
     for (const Entry& entry : entries)
         paths << bytesValue(entry.path);
-    SqlRows rows =
-        mConnection.ask("SELECT DISTINCT series.study_id FROM file JOIN series ON series.id = file.series_id"
-                        " WHERE file.path IN (" +
-                            repeated("?", paths.size()) + ")",
-                        paths);
-    while (rows.next())
-        mTouched.insert(rows.number(0));
+    QHash<QByteArray, Image> former;
+    SqlRows rows = mConnection.ask("SELECT file.path, series.study_id, file.sop_uid, file.kind FROM file"
+                                   " JOIN series ON series.id = file.series_id WHERE file.path IN (" +
+                                       repeated("?", paths.size()) + ")",
+                                   paths);
+    while (rows.next()) {
+        mTouched.insert(rows.number(1));
+        if (rows.number(3) == static_cast<int>(FileKind::Dicom) && !rows.text(2).isEmpty())
+            former.insert(rows.bytes(0), {rows.number(1), rows.text(2)});
+    }
+    return former;
 }
 
-qint64 FileRegistration::obtainSeries(const Entry& entry)
+/// The file registered last is the one that is shown of its image.
+void FileRegistration::settleConflicts(std::vector<Entry>& entries)
 {
-    static const QByteArray kDescribeStudy = describing("study", kStudyAttributes);
-    static const QByteArray kDescribeSeries = describing("series", kSeriesAttributes);
-    Known& study = obtainStudy(entry.studyUID);
-    Known& series = obtainSeries(study.id, entry.seriesUID);
+    QHash<QByteArray, std::vector<Entry*>> byImage;
+    for (Entry& entry : entries) {
+        if (!entry.isNamedImage())
+            continue;
+        std::vector<Entry*>& same = byImage[entry.sopUID];
+        for (Entry* other : same)
+            tellConflict(entry, *other);
+        for (Entry* other : same)
+            other->isShown = other->isShown && other->studyId != entry.studyId;
+        same.push_back(&entry);
+    }
+    if (byImage.isEmpty())
+        return;
+    QVariantList uids;
+    for (const Entry& entry : entries)
+        uids << textValue(entry.sopUID);
+    QList<QByteArray> replaced;
+    {
+        SqlRows rows = mConnection.ask("SELECT file.path, file.sop_uid, series.study_id, study.uid FROM file"
+                                       " JOIN series ON series.id = file.series_id"
+                                       " JOIN study ON study.id = series.study_id"
+                                       " WHERE file.kind = 1 AND file.is_shown = 1 AND file.sop_uid <> ''"
+                                       " AND file.sop_uid IN (" +
+                                           repeated("?", uids.size()) + ") ORDER BY file.path",
+                                       uids);
+        while (rows.next()) {
+            Entry other;
+            other.path = rows.bytes(0);
+            const bool isTakenAnew = std::any_of(entries.begin(), entries.end(),
+                                                 [&](const Entry& each) { return each.path == other.path; });
+            if (isTakenAnew)
+                continue;
+            other.studyUID = rows.text(3);
+            other.studyId = rows.number(2);
+            for (const Entry* entry : byImage.value(rows.text(1))) {
+                tellConflict(*entry, other);
+                if (entry->studyId == other.studyId)
+                    replaced.append(other.path);
+            }
+        }
+    }
+    for (const QByteArray& path : qAsConst(replaced))
+        mConnection.change("UPDATE file SET is_shown = 0 WHERE path = ?", {bytesValue(path)});
+}
+
+void FileRegistration::tellConflict(const Entry& entry, const Entry& other)
+{
+    const auto kind =
+        entry.studyId == other.studyId ? FileConflict::Kind::Replaces : FileConflict::Kind::AlsoInOtherStudy;
+    mOutcome->conflicts.push_back(
+        {kind, entry.path, entry.sopUID, entry.studyUID, other.path, other.studyUID});
+}
+
+void FileRegistration::place(Entry& entry)
+{
+    Known& study = knownStudy(entry.studyUID);
+    Known& series = knownSeries(study.id, entry.seriesUID);
     mTouched.insert(study.id);
     if (entry.attributes && !study.isDescribed) {
-        mConnection.change(kDescribeStudy, description(*entry.attributes, kStudyAttributes, study.id));
+        describeStudy(mConnection, study.id, *entry.attributes);
         study.isDescribed = true;
     }
     if (entry.attributes && !series.isDescribed) {
-        mConnection.change(kDescribeSeries, description(*entry.attributes, kSeriesAttributes, series.id));
+        describeSeries(mConnection, series.id, *entry.attributes);
         series.isDescribed = true;
     }
-    return series.id;
+    entry.studyId = study.id;
+    entry.seriesId = series.id;
 }
 
-FileRegistration::Known& FileRegistration::obtainStudy(const QByteArray& uid)
+FileRegistration::Known& FileRegistration::knownStudy(const QByteArray& uid)
 {
     Known& study = mStudies[uid];
     if (study.id != 0)
@@ -187,7 +252,7 @@ FileRegistration::Known& FileRegistration::obtainStudy(const QByteArray& uid)
     return study;
 }
 
-FileRegistration::Known& FileRegistration::obtainSeries(qint64 studyId, const QByteArray& uid)
+FileRegistration::Known& FileRegistration::knownSeries(qint64 studyId, const QByteArray& uid)
 {
     Known& series = mSeries[{studyId, uid}];
     if (series.id != 0)

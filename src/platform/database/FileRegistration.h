@@ -20,8 +20,8 @@ public:
     {
     }
 
-    /// Throws DatabaseError. `requests` receives the request left for each study touched, by Study Instance UID.
-    void run(const FileRecords& files, QMap<QByteArray, qint64>& requests);
+    /// Throws DatabaseError. `outcome` is complete when it returns.
+    void run(const FileRecords& files, RegistrationOutcome& outcome);
 
 private:
     struct Entry;
@@ -33,17 +33,27 @@ private:
         bool isDescribed = false;
     };
 
+    /// An image of a study, by the study's id and the image's SOP Instance UID.
+    using Image = QPair<qint64, QByteArray>;
+
     static std::vector<Entry> inOrder(const FileRecords& files);
-    void put(const std::vector<Entry>& entries);
-    qint64 obtainSeries(const Entry& entry);
-    Known& obtainStudy(const QByteArray& uid);
-    Known& obtainSeries(qint64 studyId, const QByteArray& uid);
-    void noteFormerStudies(const std::vector<Entry>& entries);
+    void followCorrections(std::vector<Entry>& entries);
+    void put(std::vector<Entry> entries);
+    void place(Entry& entry);
+    Known& knownStudy(const QByteArray& uid);
+    Known& knownSeries(qint64 studyId, const QByteArray& uid);
+    QHash<QByteArray, Image> formerImages(const std::vector<Entry>& entries);
+    void settleConflicts(std::vector<Entry>& entries);
+    void tellConflict(const Entry& entry, const Entry& other);
+    void write(const std::vector<Entry>& entries);
 
     SqlConnection& mConnection;
+    RegistrationOutcome* mOutcome = nullptr;
+    qint64 mNumber = 0;  // of the next file
     QHash<QByteArray, Known> mStudies;
     QHash<QPair<qint64, QByteArray>, Known> mSeries;
     QSet<qint64> mTouched;
+    QSet<Image> mLeft;  // images whose shown file may be another one now
 };
 
 }  // namespace Kxg

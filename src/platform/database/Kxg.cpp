@@ -1,10 +1,10 @@
 #include "platform/database/Kxg.h"
 
 #include "platform/base/LogFile.h"
-#include "platform/database/FileKind.h"
 #include "platform/database/QuestionConnection.h"
 #include "platform/database/SqlConnection.h"
 #include "platform/database/StudyContent.h"
+#include "platform/database/StudyListing.h"
 
 #include <QHash>
 
@@ -15,9 +15,6 @@ namespace Kxg
 namespace
 {
 
-constexpr int kDicom = static_cast<int>(FileKind::Dicom);
-constexpr int kVolume = static_cast<int>(FileKind::Volume);
-
 struct StudyFiles
 {
     std::vector<std::string> dicom, volumes;
@@ -27,17 +24,14 @@ struct StudyFiles
 StudyFiles readFiles(SqlConnection& connection, int studyId)
 {
     StudyFiles files;
-    SqlRows rows = connection.ask("SELECT file.kind, file.path, series.uid FROM series"
-                                  " JOIN file ON file.series_id = series.id"
-                                  " WHERE series.study_id = ? ORDER BY file.path",
-                                  {studyId});
-    while (rows.next()) {
-        const bool isVolume = rows.number(0) == kVolume;
-        (isVolume ? files.volumes : files.dicom).push_back(rows.bytes(1).toStdString());
-        if (isVolume)
-            files.withVolume.insert(rows.text(2).toStdString());
+    for (const ListedImage& image : listImages(connection, studyId))
+        files.dicom.push_back(image.path.toStdString());
+    for (const ListedVolume& volume : listVolumes(connection, studyId)) {
+        if (files.volumes.empty() || files.volumes.back() != volume.path.toStdString())
+            files.volumes.push_back(volume.path.toStdString());
+        files.withVolume.insert(volume.seriesInstanceUID.toStdString());
     }
-    // A study goes with its last file.
+    // Without files it is about to be forgotten.
     if (files.dicom.empty() && files.volumes.empty())
         throw DatabaseError(QStringLiteral("there is no study of id %1").arg(studyId));
     return files;
@@ -84,13 +78,9 @@ void readVolumes(SqlConnection& connection, qint64 studyId, DicomDirectoryEntry&
     QHash<QByteArray, DicomDirectoryEntry*> bySeries;
     for (DicomDirectoryEntry& series : study.entries)
         bySeries.insert(series.seriesInstanceUID, &series);
-    SqlRows rows =
-        connection.ask("SELECT series.uid, file.path FROM series JOIN file ON file.series_id = series.id"
-                       " WHERE series.study_id = ? AND file.kind = ? ORDER BY file.path",
-                       {studyId, kVolume});
-    while (rows.next())
-        if (DicomDirectoryEntry* series = bySeries.value(rows.text(0)))
-            series->entries.push_back(volumeEntry(*series, rows.bytes(1)));
+    for (const ListedVolume& volume : listVolumes(connection, studyId))
+        if (DicomDirectoryEntry* series = bySeries.value(volume.seriesInstanceUID))
+            series->entries.push_back(volumeEntry(*series, volume.path));
     for (DicomDirectoryEntry& series : study.entries)
         std::stable_sort(series.entries.begin(), series.entries.end(),
                          [](const auto& a, const auto& b) { return a.name < b.name; });
@@ -120,6 +110,9 @@ Kdd::Result GetStudy(const QByteArray& studyUID, std::shared_ptr<DicomDirectoryE
         const auto entry = std::make_shared<DicomDirectoryEntry>();
         entry->studyInstanceUID = studyUID;
         readSeries(connection, studyId, *entry);
+        // Without files it is about to be forgotten.
+        if (entry->entries.empty())
+            return;
         readVolumes(connection, studyId, *entry);
         study = entry;
     });
@@ -129,18 +122,13 @@ Kdd::Result GetSeries(const QByteArray& studyUID, QMap<QByteArray, std::shared_p
 {
     return askDatabase([&](SqlConnection& connection) {
         QMap<QByteArray, std::shared_ptr<SeriesInfo>> found;
-        SqlRows rows = connection.ask("SELECT series.uid, file.sop_uid, file.path FROM study"
-                                      " JOIN series ON series.study_id = study.id"
-                                      " JOIN file ON file.series_id = series.id"
-                                      " WHERE study.uid = ? AND file.kind = ? ORDER BY file.path",
-                                      {textValue(studyUID), kDicom});
-        while (rows.next()) {
-            std::shared_ptr<SeriesInfo>& info = found[rows.text(0)];
+        for (const ListedImage& image : listImages(connection, findStudyId(connection, studyUID))) {
+            std::shared_ptr<SeriesInfo>& info = found[image.seriesInstanceUID];
             if (!info) {
                 info = std::make_shared<SeriesInfo>();
-                info->seriesInstanceUID = rows.text(0);
+                info->seriesInstanceUID = image.seriesInstanceUID;
             }
-            info->images.push_back({rows.text(1), rows.bytes(2)});
+            info->images.push_back({image.sopInstanceUID, image.path});
         }
         series.swap(found);
     });

@@ -48,6 +48,34 @@ const QStringList kSteps[] = {
             "CREATE TABLE config (section {text} NOT NULL, name {text} NOT NULL, value {bytes} NOT NULL,"
             " PRIMARY KEY (section, name))"),
     },
+    {
+        // Of several files of one image in a study one is shown: the one registered last, which has the greatest number.
+        QStringLiteral("CREATE TABLE registration (last BIGINT NOT NULL)"),
+        QStringLiteral("INSERT INTO registration (last) VALUES (0)"),
+        QStringLiteral("ALTER TABLE file ADD COLUMN registered BIGINT NOT NULL DEFAULT 0"),
+        QStringLiteral("ALTER TABLE file ADD COLUMN is_shown SMALLINT NOT NULL DEFAULT 1"),
+        QStringLiteral("CREATE INDEX file_of_sop_uid ON file (sop_uid)"),
+        // So far it was the last by path.
+        QStringLiteral("UPDATE file SET is_shown = 0 WHERE kind = 1 AND sop_uid <> '' AND EXISTS"
+                       " (SELECT 1 FROM file later JOIN series ON series.id = later.series_id"
+                       " WHERE later.kind = 1 AND later.sop_uid = file.sop_uid AND later.path > file.path"
+                       " AND series.study_id = (SELECT study_id FROM series WHERE id = file.series_id))"),
+        QStringLiteral("ALTER TABLE study ADD COLUMN tag_file_size BIGINT NOT NULL DEFAULT 0"),
+        QStringLiteral("ALTER TABLE study ADD COLUMN tag_file_digest {bytes}"),
+        // A request counts from this moment on [ms since 1970].
+        QStringLiteral("ALTER TABLE build_request ADD COLUMN due BIGINT NOT NULL DEFAULT 0"),
+        // An image is known by its SOP Instance UID, or by its path where it has none; hence bytes.
+        QStringLiteral("CREATE TABLE correction (id {id}, study_uid {text} NOT NULL, image {bytes} NOT NULL,"
+                       " shown_study_uid {text} NOT NULL, shown_series_uid {text} NOT NULL,"
+                       " shown_image {bytes} NOT NULL, changes {bytes} NOT NULL, UNIQUE (study_uid, image))"),
+        QStringLiteral("CREATE INDEX correction_of_shown_image ON correction (shown_study_uid, shown_image)"),
+        // Series that also have images of a volume file of another series, because a correction moved them.
+        QStringLiteral("CREATE TABLE volume_share"
+                       " (path {bytes} NOT NULL REFERENCES file (path) ON DELETE CASCADE,"
+                       " series_id BIGINT NOT NULL REFERENCES series (id) ON DELETE CASCADE,"
+                       " PRIMARY KEY (path, series_id))"),
+        QStringLiteral("CREATE INDEX volume_share_of_series ON volume_share (series_id)"),
+    },
 };
 
 QString firstRow(SqlConnection& connection, const QString& question)

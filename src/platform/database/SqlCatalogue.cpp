@@ -1,19 +1,18 @@
 #include "platform/database/SqlCatalogue.h"
 
-#include "platform/database/FileKind.h"
+#include "platform/database/CorrectionRows.h"
 #include "platform/database/FileRegistration.h"
 #include "platform/database/Schema.h"
 #include "platform/database/StudyContent.h"
+#include "platform/database/StudyListing.h"
 
 #include <algorithm>
+#include <utility>
 
 namespace Kxg
 {
 namespace
 {
-
-constexpr int kDicom = static_cast<int>(FileKind::Dicom);
-constexpr int kVolume = static_cast<int>(FileKind::Volume);
 
 QByteArray joined(const QSet<QByteArray>& texts)
 {
@@ -32,8 +31,9 @@ QByteArray withoutSlash(QByteArray path)
 /// One row for each series, the series of a study together.
 const char kListSeries[] =
     "SELECT study.id, study.uid, study.patient_name, study.patient_id, study.study_date,"
-    " EXISTS (SELECT 1 FROM build_request WHERE build_request.study_id = study.id), series.modality,"
-    " SUM(CASE WHEN file.kind = ? THEN 1 ELSE 0 END), SUM(CASE WHEN file.kind = ? THEN 1 ELSE 0 END)"
+    " EXISTS (SELECT 1 FROM build_request WHERE build_request.study_id = study.id AND due <= ?),"
+    " series.modality, SUM(CASE WHEN file.kind = 1 AND file.is_shown = 1 THEN 1 ELSE 0 END),"
+    " SUM(CASE WHEN file.kind = 2 THEN 1 ELSE 0 END)"
     " FROM study JOIN series ON series.study_id = study.id JOIN file ON file.series_id = series.id"
     " GROUP BY study.id, series.id ORDER BY study.uid, series.id";
 
@@ -89,12 +89,21 @@ Kdd::Result SqlCatalogue::knownFiles(const QByteArray& path, QHash<QByteArray, F
     });
 }
 
-Kdd::Result SqlCatalogue::registerFiles(const FileRecords& files, QMap<QByteArray, qint64>& requests)
+Kdd::Result Catalogue::registerFiles(const FileRecords& files, QMap<QByteArray, qint64>& requests)
 {
-    QMap<QByteArray, qint64> left;
-    Kdd::Result result = transact(Access::Write, [&] { FileRegistration(mConnection).run(files, left); });
+    RegistrationOutcome outcome;
+    Kdd::Result result = registerFiles(files, outcome);
     if (result.good())
-        requests.swap(left);
+        requests.swap(outcome.requests);
+    return result;
+}
+
+Kdd::Result SqlCatalogue::registerFiles(const FileRecords& files, RegistrationOutcome& outcome)
+{
+    RegistrationOutcome made;
+    Kdd::Result result = transact(Access::Write, [&] { FileRegistration(mConnection).run(files, made); });
+    if (result.good())
+        outcome = std::move(made);
     return result;
 }
 
@@ -113,8 +122,10 @@ Kdd::Result SqlCatalogue::removeFiles(const QVector<QByteArray>& paths)
             mConnection.change("DELETE FROM file WHERE path = ?", {bytesValue(path)});
         }
         QMap<QByteArray, qint64> requests;
-        for (const qint64 studyId : qAsConst(touched))
+        for (const qint64 studyId : qAsConst(touched)) {
+            showNewestOfAll(mConnection, studyId);
             concludeChange(mConnection, studyId, requests);
+        }
     });
 }
 
@@ -126,8 +137,10 @@ Kdd::Result SqlCatalogue::removeFiles(const QByteArray& studyUID, const QByteArr
         const QByteArray sql =
             "DELETE FROM file WHERE series_id IN (SELECT id FROM series WHERE study_id = ?" + condition;
         QMap<QByteArray, qint64> requests;
-        if (mConnection.change(sql, QVariantList{studyId} + values) > 0)
-            concludeChange(mConnection, studyId, requests);
+        if (mConnection.change(sql, QVariantList{studyId} + values) == 0)
+            return;
+        showNewestOfAll(mConnection, studyId);
+        concludeChange(mConnection, studyId, requests);
     });
 }
 
@@ -143,17 +156,60 @@ Kdd::Result SqlCatalogue::removeSeries(const QByteArray& studyUID, const QByteAr
 
 Kdd::Result SqlCatalogue::removeImage(const QByteArray& studyUID, const QByteArray& sopUID)
 {
-    return removeFiles(studyUID, ") AND kind = ? AND sop_uid = ?", {kDicom, textValue(sopUID)});
+    return removeFiles(studyUID,
+                       ") AND kind = 1 AND ((sop_uid = ? AND sop_uid <> '') OR (sop_uid = '' AND path = ?))",
+                       {textValue(sopUID), bytesValue(sopUID)});
+}
+
+// ---- corrections
+
+Kdd::Result SqlCatalogue::recordCorrections(const std::vector<ImageCorrection>& corrections,
+                                            QMap<QByteArray, qint64>& requests)
+{
+    QMap<QByteArray, qint64> left;
+    Kdd::Result result = transact(Access::Write, [&] {
+        QSet<qint64> touched;
+        for (const ImageCorrection& correction : corrections)
+            recordCorrection(mConnection, correction, touched);
+        for (const qint64 studyId : qAsConst(touched))
+            concludeChange(mConnection, studyId, left);
+    });
+    if (result.good())
+        requests.swap(left);
+    return result;
+}
+
+Kdd::Result SqlCatalogue::corrections(const QByteArray& studyUID, std::vector<ImageCorrection>& corrections)
+{
+    return transact(Access::Read, [&] { corrections = correctionsOf(mConnection, studyUID); });
 }
 
 // ---- studies
+
+Kdd::Result SqlCatalogue::studyContents(const QByteArray& studyUID, StudyContents& contents)
+{
+    return transact(Access::Read, [&] {
+        contents = {};
+        const qint64 studyId = findStudyId(mConnection, studyUID);
+        contents.images = listImages(mConnection, studyId);
+        for (const ListedVolume& volume : listVolumes(mConnection, studyId)) {
+            if (contents.volumes.isEmpty() || contents.volumes.last() != volume.path)
+                contents.volumes.append(volume.path);
+        }
+        contents.isCorrected = !correctionsOf(mConnection, studyUID).empty();
+        SqlRows rows =
+            mConnection.ask("SELECT tag_file_size, tag_file_digest FROM study WHERE id = ?", {studyId});
+        if (rows.next())
+            contents.tagFile = {rows.number(0), rows.bytes(1)};
+    });
+}
 
 Kdd::Result SqlCatalogue::listStudies(std::vector<StudySummary>& studies)
 {
     return transact(Access::Read, [&] {
         std::vector<StudySummary> list;
         QSet<QByteArray> modalities;
-        SqlRows rows = mConnection.ask(kListSeries, {kDicom, kVolume});
+        SqlRows rows = mConnection.ask(kListSeries, {presentMs()});
         while (rows.next()) {
             if (list.empty() || list.back().id != rows.number(0)) {
                 list.push_back(summaryOf(rows));
@@ -192,8 +248,8 @@ Kdd::Result SqlCatalogue::volumeFiles(const QByteArray& studyUID, QVector<QByteA
         QVector<QByteArray> found;
         SqlRows rows = mConnection.ask("SELECT file.path FROM study JOIN series ON series.study_id = study.id"
                                        " JOIN file ON file.series_id = series.id"
-                                       " WHERE study.uid = ? AND file.kind = ? ORDER BY file.path",
-                                       {textValue(studyUID), kVolume});
+                                       " WHERE study.uid = ? AND file.kind = 2 ORDER BY file.path",
+                                       {textValue(studyUID)});
         while (rows.next())
             found.push_back(rows.bytes(0));
         paths.swap(found);
@@ -207,12 +263,13 @@ Kdd::Result SqlCatalogue::waitingStudies(const QByteArray& path, QVector<QByteAr
     const QByteArray folder = withoutSlash(path);
     return transact(Access::Read, [&] {
         QVector<QByteArray> found;
-        SqlRows rows =
-            mConnection.ask("SELECT DISTINCT study.uid FROM file JOIN series ON series.id = file.series_id"
-                            " JOIN study ON study.id = series.study_id"
-                            " JOIN build_request ON build_request.study_id = study.id"
-                            " WHERE file.path = ? OR (file.path >= ? AND file.path < ?) ORDER BY study.uid",
-                            {bytesValue(folder), bytesValue(folder + '/'), bytesValue(folder + '0')});
+        SqlRows rows = mConnection.ask(
+            "SELECT DISTINCT study.uid FROM file JOIN series ON series.id = file.series_id"
+            " JOIN study ON study.id = series.study_id"
+            " JOIN build_request ON build_request.study_id = study.id"
+            " WHERE (file.path = ? OR (file.path >= ? AND file.path < ?))"
+            " AND build_request.due <= ? ORDER BY study.uid",
+            {bytesValue(folder), bytesValue(folder + '/'), bytesValue(folder + '0'), presentMs()});
         while (rows.next())
             found.push_back(rows.text(0));
         studyUIDs.swap(found);

@@ -14,22 +14,28 @@ public:
     explicit SqlCatalogue(const DatabaseAddress& address);
 
     Kdd::Result knownFiles(const QByteArray& path, QHash<QByteArray, FileStamp>& stamps) override;
-    Kdd::Result registerFiles(const FileRecords& files, QMap<QByteArray, qint64>& requests) override;
+    Kdd::Result registerFiles(const FileRecords& files, RegistrationOutcome& outcome) override;
     Kdd::Result removeFiles(const QVector<QByteArray>& paths) override;
     Kdd::Result removeStudy(const QByteArray& studyUID) override;
     Kdd::Result removeSeries(const QByteArray& studyUID, const QByteArray& seriesUID) override;
     Kdd::Result removeImage(const QByteArray& studyUID, const QByteArray& sopUID) override;
 
+    Kdd::Result recordCorrections(const std::vector<ImageCorrection>& corrections,
+                                  QMap<QByteArray, qint64>& requests) override;
+    Kdd::Result corrections(const QByteArray& studyUID, std::vector<ImageCorrection>& corrections) override;
+
+    Kdd::Result studyContents(const QByteArray& studyUID, StudyContents& contents) override;
     Kdd::Result listStudies(std::vector<StudySummary>& studies) override;
     Kdd::Result findStudies(const QByteArray& prefix, int limit, QVector<QByteArray>& studyUIDs) override;
     Kdd::Result volumeFiles(const QByteArray& studyUID, QVector<QByteArray>& paths) override;
 
-    Kdd::Result requestBuild(const QVector<QByteArray>& studyUIDs) override;
+    Kdd::Result requestBuild(const QVector<QByteArray>& studyUIDs, IfGone ifGone) override;
+    Kdd::Result settleNow() override;
     Kdd::Result waitingStudies(const QByteArray& path, QVector<QByteArray>& studyUIDs) override;
     Kdd::Result countWaiting(int& studies) override;
     Kdd::Result claimNext(const QSet<int>& except, std::unique_ptr<StudyClaim>& claim) override;
-    Kdd::Result claim(const QByteArray& studyUID, int patienceMs,
-                      std::unique_ptr<StudyClaim>& claim) override;
+    Kdd::Result claim(const QByteArray& studyUID, int patienceMs, std::unique_ptr<StudyClaim>& claim,
+                      IfAbsent ifAbsent) override;
     Kdd::Result finishRequests(const QVector<qint64>& requests) override;
 
     Kdd::Result setConfig(const QByteArray& section, const QByteArray& key, const QByteArray& value) override;

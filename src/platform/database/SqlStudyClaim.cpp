@@ -1,5 +1,6 @@
 #include "platform/database/SqlCatalogue.h"
 #include "platform/database/StudyContent.h"
+#include "platform/database/StudyDescription.h"
 #include "platform/database/StudyLock.h"
 
 #include <QElapsedTimer>
@@ -70,14 +71,62 @@ public:
 
     Kdd::Result finish() override
     {
-        return attempt(mConnection.address(), [this] {
-            mLock->confirm();
-            mConnection.transact(SqlConnection::Access::Write,
-                                 [this] { deleteRequests(mConnection, mStudy.requests); });
+        return conclude([] {});
+    }
+
+    Kdd::Result finish(const BuiltStudy& built) override
+    {
+        return conclude([&] {
+            mConnection.change("UPDATE study SET tag_file_size = ?, tag_file_digest = ? WHERE id = ?",
+                               {built.tagFile.size, bytesValue(built.tagFile.digest), mStudyId});
+            describe(built.series);
+            if (built.settleAt > 0)
+                leaveRequest(mConnection, mStudyId, built.settleAt);
+        });
+    }
+
+    Kdd::Result finishRemoved() override
+    {
+        return conclude([this] {
+            mConnection.change("UPDATE study SET tag_file_size = 0, tag_file_digest = NULL WHERE id = ?",
+                               {mStudyId});
+            mConnection.change("DELETE FROM study WHERE id = ?"
+                               " AND NOT EXISTS (SELECT 1 FROM series WHERE series.study_id = study.id)"
+                               " AND NOT EXISTS (SELECT 1 FROM build_request"
+                               " WHERE build_request.study_id = study.id)",
+                               {mStudyId});
         });
     }
 
 private:
+    Kdd::Result conclude(const std::function<void()>& work)
+    {
+        return attempt(mConnection.address(), [&] {
+            mLock->confirm();
+            mConnection.transact(SqlConnection::Access::Write, [&] {
+                deleteRequests(mConnection, mStudy.requests);
+                work();
+            });
+        });
+    }
+
+    void describe(const std::vector<DicomFileRecord>& series)
+    {
+        if (!series.empty())
+            describeStudy(mConnection, mStudyId, series.front());
+        for (const DicomFileRecord& image : series) {
+            qint64 seriesId = 0;
+            {
+                SqlRows rows = mConnection.ask("SELECT id FROM series WHERE study_id = ? AND uid = ?",
+                                               {mStudyId, textValue(image.seriesInstanceUID)});
+                seriesId = rows.next() ? rows.number(0) : 0;
+            }
+            // It may have been removed meanwhile.
+            if (seriesId != 0)
+                describeSeries(mConnection, seriesId, image);
+        }
+    }
+
     SqlConnection& mConnection;
     const std::unique_ptr<StudyLock> mLock;
     const qint64 mStudyId;
@@ -96,7 +145,8 @@ std::vector<Request> pageOfQueue(SqlConnection& connection, qint64 last)
     std::vector<Request> page;
     connection.transact(SqlConnection::Access::Read, [&] {
         SqlRows rows = connection.ask(
-            "SELECT id, study_id FROM build_request WHERE id > ? ORDER BY id LIMIT ?", {last, kPageOfQueue});
+            "SELECT id, study_id FROM build_request WHERE id > ? AND due <= ? ORDER BY id LIMIT ?",
+            {last, presentMs(), kPageOfQueue});
         while (rows.next())
             page.push_back({rows.number(0), rows.number(1)});
     });
@@ -162,10 +212,16 @@ private:
 
 /// Null when another holds the study.
 std::unique_ptr<StudyClaim> tryClaim(SqlConnection& connection, std::unique_ptr<StudyLock>& lock,
-                                     const QByteArray& studyUID)
+                                     const QByteArray& studyUID, Catalogue::IfAbsent ifAbsent)
 {
     qint64 studyId = 0;
-    connection.transact(SqlConnection::Access::Read, [&] { studyId = obtainStudyId(connection, studyUID); });
+    connection.transact(SqlConnection::Access::Read, [&] {
+        studyId = ifAbsent == Catalogue::IfAbsent::Create ? findStudyId(connection, studyUID)
+                                                          : obtainStudyId(connection, studyUID);
+    });
+    if (studyId == 0)
+        connection.transact(SqlConnection::Access::Write,
+                            [&] { studyId = obtainStudy(connection, studyUID); });
     if (!lock->tryLock(studyId))
         return nullptr;
     LockedStudy study = readLocked(connection, studyId);
@@ -179,18 +235,26 @@ std::unique_ptr<StudyClaim> tryClaim(SqlConnection& connection, std::unique_ptr<
 
 }  // namespace
 
-Kdd::Result SqlCatalogue::requestBuild(const QVector<QByteArray>& studyUIDs)
+Kdd::Result SqlCatalogue::requestBuild(const QVector<QByteArray>& studyUIDs, IfGone ifGone)
 {
     return transact(Access::Write, [&] {
         for (const QByteArray& uid : studyUIDs)
-            leaveRequest(mConnection, obtainStudyId(mConnection, uid));
+            leaveRequest(mConnection, ifGone == IfGone::PassOver ? findStudyId(mConnection, uid)
+                                                                 : obtainStudyId(mConnection, uid));
     });
+}
+
+Kdd::Result SqlCatalogue::settleNow()
+{
+    return transact(Access::Write,
+                    [&] { mConnection.change("UPDATE build_request SET due = 0 WHERE due > 0"); });
 }
 
 Kdd::Result SqlCatalogue::countWaiting(int& studies)
 {
     return transact(Access::Read, [&] {
-        SqlRows rows = mConnection.ask("SELECT COUNT(DISTINCT study_id) FROM build_request");
+        SqlRows rows = mConnection.ask("SELECT COUNT(DISTINCT study_id) FROM build_request WHERE due <= ?",
+                                       {presentMs()});
         if (rows.next())
             studies = static_cast<int>(rows.number(0));
     });
@@ -203,14 +267,14 @@ Kdd::Result SqlCatalogue::claimNext(const QSet<int>& except, std::unique_ptr<Stu
 }
 
 Kdd::Result SqlCatalogue::claim(const QByteArray& studyUID, int patienceMs,
-                                std::unique_ptr<StudyClaim>& claim)
+                                std::unique_ptr<StudyClaim>& claim, IfAbsent ifAbsent)
 {
     claim.reset();
     return attempt(mConnection.address(), [&] {
         QElapsedTimer waited;
         waited.start();
         std::unique_ptr<StudyLock> lock = StudyLock::make(mConnection.address());
-        while (!(claim = tryClaim(mConnection, lock, studyUID)) && waited.elapsed() < patienceMs)
+        while (!(claim = tryClaim(mConnection, lock, studyUID, ifAbsent)) && waited.elapsed() < patienceMs)
             QThread::msleep(kPause);
     });
 }

@@ -2,6 +2,8 @@
 
 #include "platform/database/SqlConnection.h"
 
+#include <QDateTime>
+
 namespace Kxg
 {
 
@@ -19,10 +21,32 @@ qint64 obtainStudyId(SqlConnection& connection, const QByteArray& studyUID)
     return id;
 }
 
-qint64 leaveRequest(SqlConnection& connection, qint64 studyId)
+qint64 obtainStudy(SqlConnection& connection, const QByteArray& studyUID)
 {
-    SqlRows rows = connection.ask(
-        "INSERT INTO build_request (study_id) SELECT id FROM study WHERE id = ? RETURNING id", {studyId});
+    const qint64 id = findStudyId(connection, studyUID);
+    if (id != 0)
+        return id;
+    SqlRows made = connection.ask("INSERT INTO study (uid) VALUES (?) RETURNING id", {textValue(studyUID)});
+    return made.next() ? made.number(0) : 0;
+}
+
+qint64 obtainSeries(SqlConnection& connection, qint64 studyId, const QByteArray& seriesUID)
+{
+    const QVariantList key = {studyId, textValue(seriesUID)};
+    {
+        SqlRows found = connection.ask("SELECT id FROM series WHERE study_id = ? AND uid = ?", key);
+        if (found.next())
+            return found.number(0);
+    }
+    SqlRows made = connection.ask("INSERT INTO series (study_id, uid) VALUES (?, ?) RETURNING id", key);
+    return made.next() ? made.number(0) : 0;
+}
+
+qint64 leaveRequest(SqlConnection& connection, qint64 studyId, qint64 due)
+{
+    SqlRows rows = connection.ask("INSERT INTO build_request (study_id, due)"
+                                  " SELECT id, CAST(? AS BIGINT) FROM study WHERE id = ? RETURNING id",
+                                  {due, studyId});
     return rows.next() ? rows.number(0) : 0;
 }
 
@@ -31,15 +55,45 @@ void concludeChange(SqlConnection& connection, qint64 studyId, QMap<QByteArray, 
     connection.change("DELETE FROM series WHERE study_id = ?"
                       " AND NOT EXISTS (SELECT 1 FROM file WHERE file.series_id = series.id)",
                       {studyId});
-    connection.change("DELETE FROM study WHERE id = ?"
-                      " AND NOT EXISTS (SELECT 1 FROM series WHERE series.study_id = study.id)",
-                      {studyId});
     const qint64 request = leaveRequest(connection, studyId);
-    if (request == 0)
-        return;
     SqlRows rows = connection.ask("SELECT uid FROM study WHERE id = ?", {studyId});
     if (rows.next())
         requests.insert(rows.text(0), request);
+}
+
+qint64 takeRegistrationNumbers(SqlConnection& connection, qint64 count)
+{
+    SqlRows rows = connection.ask("UPDATE registration SET last = last + ? RETURNING last", {count});
+    return rows.next() ? rows.number(0) - count + 1 : 0;
+}
+
+void showNewest(SqlConnection& connection, qint64 studyId, const QByteArray& sopUID)
+{
+    connection.change("UPDATE file SET is_shown = 1 WHERE path ="
+                      " (SELECT newest.path FROM file newest JOIN series ON series.id = newest.series_id"
+                      " WHERE series.study_id = ? AND newest.sop_uid = ? AND newest.kind = 1"
+                      " ORDER BY newest.registered DESC, newest.path DESC LIMIT 1)",
+                      {studyId, textValue(sopUID)});
+}
+
+void showNewestOfAll(SqlConnection& connection, qint64 studyId)
+{
+    QList<QByteArray> images;
+    {
+        SqlRows rows =
+            connection.ask("SELECT DISTINCT file.sop_uid FROM file JOIN series ON series.id = file.series_id"
+                           " WHERE series.study_id = ? AND file.kind = 1 AND file.is_shown = 0",
+                           {studyId});
+        while (rows.next())
+            images.append(rows.text(0));
+    }
+    for (const QByteArray& image : qAsConst(images))
+        showNewest(connection, studyId, image);
+}
+
+qint64 presentMs()
+{
+    return QDateTime::currentMSecsSinceEpoch();
 }
 
 }  // namespace Kxg

@@ -16,11 +16,28 @@ qint64 findStudyId(SqlConnection& connection, const QByteArray& studyUID);
 /// Likewise; throws when it is not there.
 qint64 obtainStudyId(SqlConnection& connection, const QByteArray& studyUID);
 
-/// To be called once for each study touched, after everything else: removes its series that have become empty, and the
-/// study itself when nothing is left of it. Else leaves a request to build it and enters that by the study's UID.
+/// The id of a study or series, which is made when it is not there.
+qint64 obtainStudy(SqlConnection& connection, const QByteArray& studyUID);
+qint64 obtainSeries(SqlConnection& connection, qint64 studyId, const QByteArray& seriesUID);
+
+/// To be called once for each study touched, after everything else: removes its series that have become empty, leaves a
+/// request to build it and enters that by the study's UID. The study itself stays, also without files: whoever builds it
+/// then removes its tag file.
 void concludeChange(SqlConnection& connection, qint64 studyId, QMap<QByteArray, qint64>& requests);
 
-/// Leaves a request to build the study; 0 when there is no such study.
-qint64 leaveRequest(SqlConnection& connection, qint64 studyId);
+/// Leaves a request to build the study that counts from `due` on [ms since the epoch]; 0 when there is no such study.
+qint64 leaveRequest(SqlConnection& connection, qint64 studyId, qint64 due = 0);
+
+/// So many numbers of registration; the first of them.
+qint64 takeRegistrationNumbers(SqlConnection& connection, qint64 count);
+
+/// Shows of the files of one image in a study the one registered last, once the one that was shown is gone.
+void showNewest(SqlConnection& connection, qint64 studyId, const QByteArray& sopUID);
+
+/// The same for every image of the study.
+void showNewestOfAll(SqlConnection& connection, qint64 studyId);
+
+/// The present moment, against which requests are held [ms since the epoch].
+qint64 presentMs();
 
 }  // namespace Kxg

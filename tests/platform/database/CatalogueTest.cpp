@@ -1,6 +1,7 @@
 #include "DatabaseFixture.h"
 #include "platform/database/StorageManager.h"
 
+#include <limits>
 #include <set>
 
 using namespace Kxg;
@@ -33,6 +34,13 @@ protected:
         return text.toStdString();
     }
 
+    QVector<QByteArray> findStudies(const QByteArray& prefix)
+    {
+        QVector<QByteArray> found;
+        EXPECT_TRUE(catalogue().findStudies(prefix, 10, found).good());
+        return found;
+    }
+
     std::set<std::string> known(const QByteArray& path)
     {
         QHash<QByteArray, FileStamp> stamps;
@@ -50,16 +58,128 @@ INSTANTIATE_TEST_SUITE_P(Engines, CatalogueTest, testing::Values(Engine::Sqlite,
 using Paths = std::vector<std::string>;
 using PathSet = std::set<std::string>;
 
-TEST_P(CatalogueTest, AFileThatMovesTouchesBothStudiesAndAnEmptyOneGoes)
+TEST_P(CatalogueTest, AFileThatMovesTouchesBothStudiesAndAnEmptyOneWaitsToBeForgotten)
 {
-    add({dicom("/d/a", "1.1", "1.1.1"), dicom("/d/b", "1.1", "1.1.1")});
+    add({dicom("/d/a", "1.1", "1.1.1"), dicom("/d/b", "1.1", "1.1.1", "2")});
     EXPECT_EQ(add({dicom("/d/a", "1.2", "1.2.1")}).keys(), (QList<QByteArray>{"1.1", "1.2"}));
     EXPECT_EQ(studies(), "1.1   1/1/0*\n1.2   1/1/0*\n");
-    EXPECT_EQ(add(FileRecords{{}, {}, {{"/d/b", {}}}}).keys(), QList<QByteArray>());
+    EXPECT_EQ(add(FileRecords{{}, {}, {{"/d/b", {}}}}).keys(), QList<QByteArray>{"1.1"});
     EXPECT_EQ(studies(), "1.2   1/1/0*\n");
-    int waiting = 0;
-    ASSERT_TRUE(catalogue().countWaiting(waiting).good());
-    EXPECT_EQ(waiting, 1);
+    EXPECT_EQ(told("1.1"), "none");
+    auto claim = claimNext();
+    ASSERT_TRUE(claim);
+    EXPECT_EQ(claim->studyInstanceUID(), "1.1");
+    add({dicom("/d/c", "1.1", "1.1.1", "3")});
+    EXPECT_TRUE(claim->finishRemoved().good());
+    EXPECT_EQ(studies(), "1.1   1/1/0*\n1.2   1/1/0*\n");
+    EXPECT_TRUE(catalogue().removeStudy("1.1").good());
+    ASSERT_TRUE(catalogue().claim("1.1", 0, claim).good() && claim != nullptr);
+    EXPECT_TRUE(claim->finishRemoved().good());
+    EXPECT_EQ(findStudies("1.1"), QVector<QByteArray>());
+}
+
+std::string textOf(const RegistrationOutcome& outcome)
+{
+    const char* const kinds[] = {" replaces ", " also in other study ", " follows correction "};
+    QByteArray text;
+    for (const FileConflict& each : outcome.conflicts)
+        text += each.path + kinds[static_cast<int>(each.kind)] + each.otherPath + " of " +
+                each.otherStudyUID + '\n';
+    return text.toStdString();
+}
+
+TEST_P(CatalogueTest, OfSeveralFilesOfOneImageTheOneRegisteredLastIsListed)
+{
+    RegistrationOutcome first, second;
+    ASSERT_TRUE(
+        catalogue()
+            .registerFiles({{dicom("/d/z", "1", "1.1", "x"), dicom("/d/y", "2", "2.1", "x")}, {}, {}}, first)
+            .good());
+    EXPECT_EQ(textOf(first), "/d/z also in other study /d/y of 2\n");
+    ASSERT_TRUE(catalogue().registerFiles({{dicom("/d/a", "1", "1.2", "x")}, {}, {}}, second).good());
+    EXPECT_EQ(textOf(second), "/d/a also in other study /d/y of 2\n/d/a replaces /d/z of 1\n");
+    EXPECT_EQ(told("1"), "1.1 :\n1.2 :\n1.2 x /d/a\n");
+    EXPECT_EQ(studies(), "1   2/1/0*\n2   1/1/0*\n");
+    ASSERT_TRUE(catalogue().removeFiles({"/d/a"}).good());
+    EXPECT_EQ(told("1"), "1.1 :\n1.1 x /d/z\n");
+    add({dicom("/d/b", "1", "1.1", "x")});
+    add({dicom("/d/b", "1", "1.1", "other")});
+    EXPECT_EQ(told("1"), "1.1 :\n1.1 other /d/b\n1.1 x /d/z\n");
+}
+
+TEST_P(CatalogueTest, OfFilesOfOneImageInOneSetTheLastByPathIsListed)
+{
+    std::vector<DicomFileRecord> files(150, dicom("", "1", "1.1", "x"));
+    for (size_t i = 0; i < files.size(); ++i)
+        files[i].path = "/d/" + QByteArray::number(static_cast<int>(1000 + i));
+    add(files);
+    EXPECT_EQ(told("1"), "1.1 :\n1.1 x /d/1149\n");
+    EXPECT_EQ(studies(), "1   1/1/0*\n");
+}
+
+TEST_P(CatalogueTest, ImagesAreListedWhereACorrectionPutThemAndFilesFollow)
+{
+    add(FileRecords{
+        {dicom("/d/a", "1", "1.1", "x"), dicom("/d/b", "1", "1.1", "y")}, {{"/d/v", {}, "1", "1.1"}}, {}});
+    QMap<QByteArray, qint64> requests;
+    const ImageCorrection moved = {"1", "x", "2", "2.1", "x2", "changes"};
+    ASSERT_TRUE(catalogue().recordCorrections({moved}, requests).good());
+    EXPECT_EQ(requests.keys(), (QList<QByteArray>{"1", "2"}));
+    EXPECT_EQ(told("2"), "2.1 : v\n2.1 x2 /d/a\n");
+    EXPECT_EQ(told("1"), "1.1 : v\n1.1 y /d/b\n");
+    RegistrationOutcome outcome;
+    ASSERT_TRUE(catalogue().registerFiles({{dicom("/e/a", "1", "1.1", "x")}, {}, {}}, outcome).good());
+    EXPECT_EQ(textOf(outcome), "/e/a follows correction  of 2\n/e/a replaces /d/a of 2\n");
+    EXPECT_EQ(told("2"), "2.1 : v\n2.1 x2 /e/a\n");
+    std::vector<ImageCorrection> known;
+    ASSERT_TRUE(catalogue().corrections("2", known).good());
+    ASSERT_EQ(known.size(), 1U);
+    EXPECT_EQ(known.front().image + ' ' + known.front().shownImage + ' ' + known.front().changes,
+              "x x2 changes");
+    // On to a third study, and then back as if nothing had been.
+    ASSERT_TRUE(catalogue().recordCorrections({{"1", "x", "3", "3.1", "x", "more"}}, requests).good());
+    EXPECT_EQ(told("2"), "none");
+    EXPECT_EQ(told("3"), "3.1 : v\n3.1 x /e/a\n");
+    ASSERT_TRUE(catalogue().recordCorrections({{"1", "x", "1", "1.1", "x", ""}}, requests).good());
+    EXPECT_EQ(told("1"), "1.1 : v\n1.1 y /d/b\n1.1 x /e/a\n");
+    EXPECT_EQ(told("3"), "none");
+}
+
+TEST_P(CatalogueTest, AnImageWithoutUidIsCorrectedAndRemovedByItsPath)
+{
+    add({dicom("/d/a", "1", "1.1", ""), dicom("/d/b", "1", "1.1", "")});
+    QMap<QByteArray, qint64> requests;
+    ASSERT_TRUE(
+        catalogue().recordCorrections({{"1", "/d/a", "2", "2.1", "/d/a", "changes"}}, requests).good());
+    EXPECT_EQ(told("1") + told("2"), "1.1 :\n1.1  /d/b\n2.1 :\n2.1  /d/a\n");
+    EXPECT_TRUE(catalogue().removeImage("1", "").good());
+    EXPECT_EQ(told("1"), "1.1 :\n1.1  /d/b\n");
+    EXPECT_TRUE(catalogue().removeImage("1", "/d/b").good());
+    EXPECT_EQ(told("1"), "none");
+}
+
+TEST_P(CatalogueTest, WhatWasBuiltIsDescribedAndRecognised)
+{
+    add({dicom("/d/a", "1", "1.1", "x"), dicom("/d/b", "1", "1.2", "y")});
+    auto claim = claimNext();
+    ASSERT_TRUE(claim);
+    BuiltStudy built;
+    built.tagFile = {77, "digest"};
+    built.series = {dicom("/d/a", "1", "1.1"), dicom("/d/b", "1", "1.2")};
+    built.series[0].patientName = "Corrected";
+    built.series[1].modality = "CT";
+    built.settleAt = std::numeric_limits<qint64>::max();
+    ASSERT_EQ(claim->finish(built).text().toStdString(), "");
+    EXPECT_EQ(studies(), "1 Corrected CT 2/2/0\n");
+    StudyContents contents;
+    ASSERT_TRUE(catalogue().studyContents("1", contents).good());
+    EXPECT_EQ(contents.tagFile, built.tagFile);
+    EXPECT_EQ(contents.images.size(), 2U);
+    claim.reset();
+    EXPECT_FALSE(claimNext());
+    ASSERT_TRUE(catalogue().settleNow().good());
+    EXPECT_EQ(studies(), "1 Corrected CT 2/2/0*\n");
+    EXPECT_TRUE(claimNext());
 }
 
 TEST_P(CatalogueTest, ListsAreInTheOrderOfBytesWhateverTheOrderOfRegistering)
@@ -106,7 +226,7 @@ TEST_P(CatalogueTest, TheFirstDicomFileThatIsKeptDescribesItsStudy)
     EXPECT_NE(catalogue().registerFiles(bad, none).text().indexOf(QLatin1String("/d/bad")), -1);
     EXPECT_EQ(studies(), "");
     add(FileRecords{{}, {{"/d/0.volume", {}, "1", "1.1"}}, {}});
-    DicomFileRecord first = dicom("/d/a", "1", "1.1"), later = dicom("/d/b", "1", "1.2");
+    DicomFileRecord first = dicom("/d/a", "1", "1.1"), later = dicom("/d/b", "1", "1.2", "2");
     first.patientName = QByteArray("Zo\xEB\0^\xE5\xB1\xB1", 8);  // neither UTF-8 nor free of NUL
     first.modality = "MR";
     later.patientName = "Other";
@@ -119,8 +239,10 @@ TEST_P(CatalogueTest, TheFirstDicomFileThatIsKeptDescribesItsStudy)
 TEST_P(CatalogueTest, KeepsEveryFileOfALargeSetOnceWithItsLastStamp)
 {
     std::vector<DicomFileRecord> files(257, dicom("", "1", "1.1"));
-    for (size_t i = 0; i < files.size(); ++i)
+    for (size_t i = 0; i < files.size(); ++i) {
         files[i].path = "/d/" + QByteArray::number(static_cast<int>(i % 254));
+        files[i].sopInstanceUID = "1." + QByteArray::number(static_cast<int>(i % 254));
+    }
     add(files);
     for (DicomFileRecord& file : files)
         file.stamp = {5, 7};

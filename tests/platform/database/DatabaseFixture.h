@@ -93,7 +93,7 @@ protected:
     {
         Kxg::DatabaseAddress parsed;
         ASSERT_TRUE(Kxg::DatabaseAddress::parse(mAddress, parsed).good());
-        Kxg::SqlConnection(parsed, Kxg::SqlConnection::IfAbsent::Fail).execute(QString::fromUtf8(sql));
+        Kxg::SqlConnection(parsed, Kxg::SqlConnection::IfAbsent::Create).execute(QString::fromUtf8(sql));
     }
 
 private:

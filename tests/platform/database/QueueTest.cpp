@@ -84,7 +84,7 @@ TEST_P(QueueTest, RequestsThatComeWhileAStudyIsBuiltMakeItWaitAgain)
         const auto claim = claimNext();
         ASSERT_TRUE(claim);
         if (studies() == "1   1/1/0*\n")
-            add({dicom("/d/more", "1", "1")});
+            add({dicom("/d/more", "1", "1", "2")});
         EXPECT_TRUE(claim->finish().good());
         EXPECT_EQ(studies(), expected);
     }
@@ -97,11 +97,13 @@ TEST_P(QueueTest, AStudyIsClaimedByNameUnlessItIsHeldOrUnknown)
     {
         const auto held = claimNext();
         EXPECT_FALSE(canClaim("1"));
-        // Its holder is not in his own way.
+        // Its holder is not in his own way, and goes on holding a study that loses its files and gets new ones.
         EXPECT_TRUE(catalogue().removeStudy("1").good());
         addStudies(1);
-        EXPECT_TRUE(canClaim("1"));
+        EXPECT_FALSE(canClaim("1"));
     }
+    EXPECT_TRUE(canClaim("1"));
+    ASSERT_TRUE(catalogue().requestBuild({"1", "1.9"}, Catalogue::IfGone::PassOver).good());
     std::unique_ptr<StudyClaim> claim;
     for (const Kdd::Result& result :
          {catalogue().claim("1.9", 0, claim), catalogue().requestBuild({"1", "1.9"})})

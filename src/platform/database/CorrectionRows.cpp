@@ -1,0 +1,172 @@
+#include "platform/database/CorrectionRows.h"
+
+#include "platform/database/SqlConnection.h"
+#include "platform/database/StudyContent.h"
+
+namespace Kxg
+{
+namespace
+{
+
+const char kColumns[] =
+    "SELECT study_uid, image, shown_study_uid, shown_series_uid, shown_image, changes FROM correction";
+
+/// Images asked for at once; fewer are filled up, so that the statement has one text only.
+constexpr int kImagesAtOnce = 100;
+
+ImageCorrection correctionOf(const SqlRows& rows)
+{
+    return {rows.text(0), rows.bytes(1), rows.text(2), rows.text(3), rows.bytes(4), rows.bytes(5)};
+}
+
+std::vector<ImageCorrection> read(SqlRows rows)
+{
+    std::vector<ImageCorrection> found;
+    while (rows.next())
+        found.push_back(correctionOf(rows));
+    return found;
+}
+
+/// Where an image is listed before a correction is kept: where an earlier one put it, else where its file says.
+struct Place
+{
+    QByteArray studyUID;
+    QByteArray image;
+};
+
+Place placeBefore(SqlConnection& connection, const ImageCorrection& correction)
+{
+    SqlRows rows = connection.ask("SELECT shown_study_uid, shown_image FROM correction"
+                                  " WHERE study_uid = ? AND image = ?",
+                                  {textValue(correction.studyInstanceUID), bytesValue(correction.image)});
+    if (rows.next())
+        return {rows.text(0), rows.bytes(1)};
+    return {correction.studyInstanceUID, correction.image};
+}
+
+struct FileRow
+{
+    QByteArray path;
+    QByteArray sopUID;
+    qint64 seriesId = 0;
+};
+
+/// The files of one image in a study, in the order in which they were registered.
+std::vector<FileRow> filesOf(SqlConnection& connection, qint64 studyId, const QByteArray& image)
+{
+    std::vector<FileRow> files;
+    SqlRows rows = connection.ask("SELECT file.path, file.sop_uid, file.series_id FROM file JOIN series"
+                                  " ON series.id = file.series_id WHERE series.study_id = ? AND file.kind = 1"
+                                  " AND (file.sop_uid = ? OR (file.sop_uid = '' AND file.path = ?))"
+                                  " ORDER BY file.registered, file.path",
+                                  {studyId, textValue(image), bytesValue(image)});
+    while (rows.next())
+        files.push_back({rows.bytes(0), rows.text(1), rows.number(2)});
+    return files;
+}
+
+/// The volume files that hold a series' images hold them still when they stand in another series.
+void shareVolumes(SqlConnection& connection, qint64 fromSeries, qint64 toSeries)
+{
+    connection.change("INSERT INTO volume_share (path, series_id)"
+                      " SELECT path, CAST(? AS BIGINT) FROM file WHERE series_id = ? AND kind = 2"
+                      " UNION SELECT path, CAST(? AS BIGINT) FROM volume_share WHERE series_id = ?"
+                      " ON CONFLICT DO NOTHING",
+                      {toSeries, fromSeries, toSeries, fromSeries});
+}
+
+/// In the order in which they were registered, so that the newest of them goes on being the one that is shown; and
+/// later than what the new place had already, which they replace there.
+void moveFiles(SqlConnection& connection, const std::vector<FileRow>& files, qint64 studyId, qint64 seriesId,
+               const QByteArray& sopUID)
+{
+    if (!sopUID.isEmpty())
+        connection.change("UPDATE file SET is_shown = 0 WHERE sop_uid = ? AND kind = 1 AND series_id IN"
+                          " (SELECT id FROM series WHERE study_id = ?)",
+                          {textValue(sopUID), studyId});
+    qint64 number = takeRegistrationNumbers(connection, static_cast<qint64>(files.size()));
+    for (const FileRow& file : files) {
+        connection.change("UPDATE file SET series_id = ?, sop_uid = ?, registered = ?, is_shown = ?"
+                          " WHERE path = ?",
+                          {seriesId, textValue(sopUID), number++,
+                           &file == &files.back() || sopUID.isEmpty() ? 1 : 0, bytesValue(file.path)});
+        if (file.seriesId != seriesId)
+            shareVolumes(connection, file.seriesId, seriesId);
+    }
+}
+
+void keep(SqlConnection& connection, const ImageCorrection& correction)
+{
+    const QVariantList key = {textValue(correction.studyInstanceUID), bytesValue(correction.image)};
+    if (correction.changes.isEmpty()) {
+        connection.change("DELETE FROM correction WHERE study_uid = ? AND image = ?", key);
+        return;
+    }
+    connection.change("INSERT INTO correction"
+                      " (study_uid, image, shown_study_uid, shown_series_uid, shown_image, changes)"
+                      " VALUES (?, ?, ?, ?, ?, ?) ON CONFLICT (study_uid, image) DO UPDATE SET"
+                      " shown_study_uid = excluded.shown_study_uid,"
+                      " shown_series_uid = excluded.shown_series_uid,"
+                      " shown_image = excluded.shown_image, changes = excluded.changes",
+                      key + QVariantList{textValue(correction.shownStudyUID),
+                                         textValue(correction.shownSeriesUID),
+                                         bytesValue(correction.shownImage), bytesValue(correction.changes)});
+}
+
+}  // namespace
+
+void recordCorrection(SqlConnection& connection, const ImageCorrection& correction, QSet<qint64>& touched)
+{
+    const Place before = placeBefore(connection, correction);
+    keep(connection, correction);
+    const qint64 oldStudy = findStudyId(connection, before.studyUID);
+    const qint64 newStudy = obtainStudy(connection, correction.shownStudyUID);
+    touched.insert(newStudy);
+    if (oldStudy == 0)
+        return;
+    touched.insert(oldStudy);
+    const std::vector<FileRow> files = filesOf(connection, oldStudy, before.image);
+    if (files.empty())
+        return;
+    const qint64 newSeries = obtainSeries(connection, newStudy, correction.shownSeriesUID);
+    // What has no UID is known by its path, which no correction changes, until one gives it a UID.
+    const QByteArray sopUID =
+        correction.shownImage == files.back().path ? QByteArray("") : correction.shownImage;
+    const bool staysInPlace =
+        oldStudy == newStudy && sopUID == files.back().sopUID && newSeries == files.back().seriesId;
+    if (staysInPlace)
+        return;
+    moveFiles(connection, files, newStudy, newSeries, sopUID);
+    // Another image may have stood behind the one that left.
+    showNewest(connection, oldStudy, before.image);
+}
+
+std::vector<ImageCorrection> correctionsOf(SqlConnection& connection, const QByteArray& studyUID)
+{
+    const QVariant uid = textValue(studyUID);
+    return read(connection.ask(QByteArray(kColumns) +
+                                   " WHERE study_uid = ? OR shown_study_uid = ? ORDER BY study_uid, image",
+                               {uid, uid}));
+}
+
+std::vector<ImageCorrection> correctionsOfImages(SqlConnection& connection, const QList<QByteArray>& images)
+{
+    static const QByteArray kOfImages =
+        QByteArray(kColumns) + " WHERE image IN (?" + QByteArray(", ?").repeated(kImagesAtOnce - 1) + ')';
+    std::vector<ImageCorrection> found;
+    for (int from = 0; from < images.size(); from += kImagesAtOnce) {
+        QVariantList values;
+        for (int i = from; i < from + kImagesAtOnce; ++i)
+            values << bytesValue(images.at(qMin(i, images.size() - 1)));
+        const std::vector<ImageCorrection> some = read(connection.ask(kOfImages, values));
+        found.insert(found.end(), some.begin(), some.end());
+    }
+    return found;
+}
+
+bool hasCorrections(SqlConnection& connection)
+{
+    return connection.ask("SELECT 1 FROM correction LIMIT 1").next();
+}
+
+}  // namespace Kxg

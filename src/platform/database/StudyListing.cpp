@@ -1,0 +1,36 @@
+#include "platform/database/StudyListing.h"
+
+#include "platform/database/SqlConnection.h"
+
+namespace Kxg
+{
+
+std::vector<ListedImage> listImages(SqlConnection& connection, qint64 studyId)
+{
+    std::vector<ListedImage> images;
+    SqlRows rows = connection.ask("SELECT file.path, series.uid, file.sop_uid FROM series"
+                                  " JOIN file ON file.series_id = series.id"
+                                  " WHERE series.study_id = ? AND file.kind = 1 AND file.is_shown = 1"
+                                  " ORDER BY file.path",
+                                  {studyId});
+    while (rows.next())
+        images.push_back({rows.bytes(0), rows.text(1), rows.text(2)});
+    return images;
+}
+
+std::vector<ListedVolume> listVolumes(SqlConnection& connection, qint64 studyId)
+{
+    std::vector<ListedVolume> volumes;
+    SqlRows rows = connection.ask("SELECT file.path AS path, series.uid FROM series"
+                                  " JOIN file ON file.series_id = series.id"
+                                  " WHERE series.study_id = ? AND file.kind = 2"
+                                  " UNION SELECT volume_share.path AS path, series.uid FROM series"
+                                  " JOIN volume_share ON volume_share.series_id = series.id"
+                                  " WHERE series.study_id = ? ORDER BY path",
+                                  {studyId, studyId});
+    while (rows.next())
+        volumes.push_back({rows.bytes(0), rows.text(1)});
+    return volumes;
+}
+
+}  // namespace Kxg

@@ -1,0 +1,81 @@
+#include "DatabaseFixture.h"
+
+using namespace Kxg;
+
+namespace
+{
+
+/// The tables as the first release made them, but for what the engines call their types.
+const char* const kFirstTables[] = {
+    "CREATE TABLE schema_version (version BIGINT NOT NULL)",
+    "INSERT INTO schema_version (version) VALUES (1)",
+    "CREATE TABLE study (id {id}, uid TEXT NOT NULL UNIQUE, is_described SMALLINT NOT NULL DEFAULT 0,"
+    " patient_name TEXT NOT NULL DEFAULT '', patient_id TEXT NOT NULL DEFAULT '',"
+    " patient_birth_date TEXT NOT NULL DEFAULT '', patient_sex TEXT NOT NULL DEFAULT '',"
+    " study_date TEXT NOT NULL DEFAULT '', study_time TEXT NOT NULL DEFAULT '',"
+    " study_description TEXT NOT NULL DEFAULT '', accession_number TEXT NOT NULL DEFAULT '')",
+    "CREATE TABLE series (id {id}, study_id BIGINT NOT NULL REFERENCES study (id), uid TEXT NOT NULL,"
+    " is_described SMALLINT NOT NULL DEFAULT 0, series_number TEXT NOT NULL DEFAULT '',"
+    " series_description TEXT NOT NULL DEFAULT '', modality TEXT NOT NULL DEFAULT '',"
+    " series_date TEXT NOT NULL DEFAULT '', series_time TEXT NOT NULL DEFAULT '',"
+    " station_name TEXT NOT NULL DEFAULT '', UNIQUE (study_id, uid))",
+    "CREATE TABLE file (path {bytes} NOT NULL PRIMARY KEY, size BIGINT NOT NULL, modified BIGINT NOT NULL,"
+    " kind SMALLINT NOT NULL, series_id BIGINT REFERENCES series (id), sop_uid TEXT NOT NULL)",
+    "CREATE INDEX file_of_series ON file (series_id)",
+    "CREATE TABLE build_request (id {id}, study_id BIGINT NOT NULL REFERENCES study (id) ON DELETE CASCADE)",
+    "CREATE INDEX build_request_of_study ON build_request (study_id)",
+    "CREATE TABLE config (section TEXT NOT NULL, name TEXT NOT NULL, value {bytes} NOT NULL,"
+    " PRIMARY KEY (section, name))",
+    "INSERT INTO study (uid, is_described, patient_name) VALUES ('1', 1, 'Doe')",
+    "INSERT INTO series (study_id, uid, modality) VALUES (1, '1.1', 'CT')",
+    "INSERT INTO file VALUES ({/d/a}, 5, 7, 1, 1, 'x'), ({/d/b}, 5, 7, 1, 1, 'x'), ({/d/c}, 5, 7, 1, 1, ''),"
+    " ({/d/d}, 5, 7, 1, 1, ''), ({/d/v}, 5, 7, 2, 1, ''), ({/d/o}, 5, 7, 0, NULL, '')",
+    "INSERT INTO build_request (study_id) VALUES (1)",
+};
+
+class MigrationTest : public DatabaseTest
+{
+protected:
+    void makeFirstTables() const
+    {
+        const bool isSqlite = GetParam() == Engine::Sqlite;
+        for (const char* statement : kFirstTables) {
+            QString sql = QString::fromLatin1(statement);
+            sql.replace(QLatin1String("{id}"),
+                        isSqlite ? QStringLiteral("INTEGER PRIMARY KEY AUTOINCREMENT")
+                                 : QStringLiteral("BIGINT GENERATED ALWAYS AS IDENTITY PRIMARY KEY"));
+            sql.replace(QLatin1String("{bytes}"),
+                        isSqlite ? QStringLiteral("BLOB") : QStringLiteral("BYTEA"));
+            for (const char* path : {"/d/a", "/d/b", "/d/c", "/d/d", "/d/v", "/d/o"}) {
+                const QString hex = QString::fromLatin1(QByteArray(path).toHex());
+                sql.replace(QLatin1Char('{') + QLatin1String(path) + QLatin1Char('}'),
+                            isSqlite ? QStringLiteral("x'%1'").arg(hex) : QStringLiteral("'\\x%1'").arg(hex));
+            }
+            execute(sql.toUtf8().constData());
+        }
+    }
+};
+
+INSTANTIATE_TEST_SUITE_P(Engines, MigrationTest, testing::Values(Engine::Sqlite, Engine::Postgres),
+                         engineName);
+
+TEST_P(MigrationTest, ADatabaseOfTheFirstReleaseKeepsAllThatItKnows)
+{
+    makeFirstTables();
+    EXPECT_EQ(studies(), "1 Doe CT 1/3/1*\n");
+    StudyContents contents;
+    ASSERT_TRUE(catalogue().studyContents("1", contents).good());
+    QByteArray paths;
+    for (const ListedImage& image : contents.images)
+        paths += image.path + ' ';
+    EXPECT_EQ(paths, "/d/b /d/c /d/d ");  // of two files of one image the last by path, as before
+    EXPECT_TRUE(contents.tagFile == TagFileStamp());
+    add({dicom("/d/0", "1", "1.1", "x")});
+    ASSERT_TRUE(catalogue().studyContents("1", contents).good());
+    EXPECT_EQ(contents.images.front().path, "/d/0");
+    QHash<QByteArray, FileStamp> known;
+    ASSERT_TRUE(catalogue().knownFiles("/d", known).good());
+    EXPECT_EQ(known.size(), 7);
+}
+
+}  // namespace
