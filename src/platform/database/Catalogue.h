@@ -2,6 +2,7 @@
 
 #include "platform/base/Export.h"
 #include "platform/base/Result.h"
+#include "platform/database/TagFileStamp.h"
 
 #include <QByteArray>
 #include <QHash>
@@ -120,15 +121,6 @@ struct ImageCorrection
 
     /// The attributes that are replaced, as whoever corrects encodes them. Empty: there is no correction any more.
     QByteArray changes;
-};
-
-/// A tag file as it was written last: the bytes that count, and their digest. An empty digest: never written.
-struct TagFileStamp
-{
-    qint64 size = 0;  ///< [bytes]
-    QByteArray digest;
-
-    bool operator==(const TagFileStamp& other) const { return size == other.size && digest == other.digest; }
 };
 
 /// An image of a study: of several files of one SOP Instance UID the one registered last.

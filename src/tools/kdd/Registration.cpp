@@ -1,9 +1,9 @@
 #include "tools/kdd/Registration.h"
 
+#include "kddlib/tagfile/StudyRecord.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "tools/kdd/Database.h"
 #include "tools/kdd/DicomInput.h"
-#include "tools/kdd/FileRecord.h"
 
 namespace Kdd
 {

@@ -2,6 +2,7 @@
 
 #include "platform/base/Export.h"
 #include "platform/base/Geometry.h"
+#include "platform/database/TagFileStamp.h"
 
 #include <QByteArray>
 #include <QFile>
@@ -257,6 +258,9 @@ public:
     /// gone. Whether anything changed.
     bool syncWithDatabase(const std::shared_ptr<Kxg::DicomDirectoryEntry>& study);
 
+    /// Of the file that this object wrote last; empty before.
+    const Kxg::TagFileStamp& stamp() const { return mStamp; }
+
     /// Why the last read, write or merge failed, in words; empty after success.
     const QString& failure() const { return mFailure; }
 
@@ -351,6 +355,7 @@ private:
     QString mCacheFilePath;
     QString mFailure;
     bool mLockedOut = false;
+    Kxg::TagFileStamp mStamp;
 
     Statistics mStatistics;  // but for series and images, which the indexes count
 

@@ -197,6 +197,7 @@ bool TagFile::writeInto(QFile& locked, const QString& path, bool cut)
         return fail(reason);
     }
     mCacheFilePath = path;
+    mStamp = {content.size(), QCryptographicHash::hash(content, QCryptographicHash::Md5)};
     if (LogFile::debugLogging())
         LogFile::printf("Written tag file %s in %d msec", qUtf8Printable(path), mStatistics.writeMs);
     return true;

@@ -1,7 +1,14 @@
-#include "tools/kdd/FileRecord.h"
+#include "kddlib/tagfile/StudyRecord.h"
 
 #include "kddlib/items/TextDecoding.h"
+#include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
+#include "platform/os/JournaledWrite.h"
+
+#include <QCryptographicHash>
+#include <QFile>
+#include <QMultiMap>
 
 #include <dcmtk/dcmdata/dcdeftag.h>
 
@@ -59,6 +66,40 @@ Kxg::DicomFileRecord fileRecord(const TagMap& image, const QByteArray& path, con
     record.seriesTime = text(DCM_SeriesTime);
     record.stationName = text(DCM_StationName);
     return record;
+}
+
+Kxg::BuiltStudy builtStudy(const TagFile& file)
+{
+    QMultiMap<QByteArray, const TagMap*> firstByPath;  // of each series
+    for (const TagMap* series : file.seriesByUID()) {
+        const TagMap* first = nullptr;
+        QByteArray firstPath;
+        for (const TagMap* image : series->children()) {
+            const QByteArray path = filePathOf(*image);
+            if (first == nullptr || path < firstPath) {
+                first = image;
+                firstPath = path;
+            }
+        }
+        if (first != nullptr)
+            firstByPath.insert(firstPath, first);
+    }
+    Kxg::BuiltStudy built;
+    built.tagFile = file.stamp();
+    for (auto it = firstByPath.cbegin(); it != firstByPath.cend(); ++it)
+        built.series.push_back(fileRecord(*it.value(), it.key(), {}));
+    return built;
+}
+
+bool isTagFile(const QString& path, const Kxg::TagFileStamp& stamp)
+{
+    QFile file(path);
+    if (stamp.digest.isEmpty() || hasJournal(path) || !file.open(QIODevice::ReadOnly) ||
+        file.size() < stamp.size)
+        return false;
+    const QByteArray content = file.read(stamp.size);
+    return content.size() == stamp.size &&
+           QCryptographicHash::hash(content, QCryptographicHash::Md5) == stamp.digest;
 }
 
 }  // namespace Kdd
