@@ -195,15 +195,21 @@ bool TagFileGenerator::createTagFile(TagFile& tagFile, int studyId, const char* 
 
 void TagFileGenerator::completeArrivals(TagFile& arrivals)
 {
+    TagFile present;
+    present.readCacheFileForStudy(arrivals.studyInstanceUID().constData(), false);
+    completeArrivals(arrivals, present);
+}
+
+void TagFileGenerator::completeArrivals(TagFile& arrivals, TagFile& present)
+{
     mLoadWatch = mVolumeWatch = mPreviewWatch = {};
     QList<QByteArray> chosen;
-    TagFile whole;
-    if (whole.readCacheFileForStudy(arrivals.studyInstanceUID().constData(), false)) {
-        for (const TagMap* image : arrivals.imagesByUID())
-            whole.addTagMap(image->clone(), nullptr, true);
-        whole.selectPreviewImages2D(chosen);
-    } else {
+    if (present.isEmpty()) {
         arrivals.selectPreviewImages2D(chosen);
+    } else {
+        for (const TagMap* image : arrivals.imagesByUID())
+            present.addTagMap(image->clone(), nullptr, true);
+        present.selectPreviewImages2D(chosen);
     }
     addPreviews(arrivals, chosen, KeptDatasets());
     finishTree(arrivals);

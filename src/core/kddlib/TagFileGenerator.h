@@ -53,6 +53,9 @@ public:
     /// cache file: makes the previews that the study will want once they are part of it, labels and optimises.
     void completeArrivals(TagFile& arrivals);
 
+    /// The same with the present cache file at hand; empty: there is none. Afterwards `present` shows the arrivals too.
+    void completeArrivals(TagFile& arrivals, TagFile& present);
+
     /// What loading DICOM files, reading volume files and making previews took in the last build [ms].
     void getTimings(int& loadMs, int& volumeMs, int& previewMs) const;
 

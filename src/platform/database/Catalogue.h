@@ -137,6 +137,7 @@ struct StudyContents
     std::vector<ListedImage> images;  ///< by path
     QVector<QByteArray> volumes;  ///< volume files, by path, those that a correction brought along included
     bool isCorrected = false;     ///< a correction concerns an image that is or was in the study
+    bool isWaiting = false;       ///< something changed since its tag file was built
     TagFileStamp tagFile;
 };
 
@@ -152,6 +153,9 @@ struct BuiltStudy
     /// When the tag file is to be built once more although nothing changed [ms since the epoch]; 0: not at all. Until
     /// then the study does not wait.
     qint64 settleAt = 0;
+
+    /// Whether the requests noted are done; else the study goes on waiting if it did.
+    bool isComplete = true;
 };
 
 /// A line of the list of studies.
@@ -167,6 +171,7 @@ struct StudySummary
     int images = 0;  ///< not files: several files of one image are one
     int volumes = 0;
     bool isWaiting = false;  ///< something changed since its tag file was built
+    TagFileStamp tagFile;
 };
 
 /// The right to build one study's tag file, which one holder has at a time among all processes and machines. It ends
@@ -181,8 +186,12 @@ public:
     virtual int studyId() const = 0;
     virtual const QByteArray& studyInstanceUID() const = 0;
 
-    /// Takes the study off the queue: the requests that were there when it was claimed are done. Requests that came
-    /// meanwhile stay.
+    /// Notes the requests that are there now, for whoever begins the work only now or has changed the study himself
+    /// since he claimed it.
+    virtual Kdd::Result noteRequests() = 0;
+
+    /// Takes the study off the queue: the requests that were there when it was claimed, or when they were noted last,
+    /// are done. Requests that came meanwhile stay.
     virtual Kdd::Result finish() = 0;
 
     /// The same, and keeps what the study now shows of itself and by what its tag file is recognised.
@@ -213,6 +222,10 @@ class KDD_EXPORT Catalogue
 public:
     /// Makes the database or brings its schema up to date. A schema newer than this program is refused.
     static std::unique_ptr<Catalogue> open(const QByteArray& address, Kdd::Result& result);
+
+    /// The same, but one that does not exist is a failure. An SQLite database that this process may not change can be
+    /// read.
+    static std::unique_ptr<Catalogue> openExisting(const QByteArray& address, Kdd::Result& result);
 
     virtual ~Catalogue() = default;
     Catalogue(const Catalogue&) = delete;

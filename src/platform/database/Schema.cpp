@@ -154,11 +154,16 @@ void bringSchemaUpToDate(SqlConnection& connection)
     connection.transact(SqlConnection::Access::Write, [&] { migrate(connection); });
 }
 
+void requireSchema(SqlConnection& connection)
+{
+    if (schemaVersion(connection) == 0)
+        throw DatabaseError(QStringLiteral("it has no tables of an image database"));
+}
+
 void requireCurrentSchema(SqlConnection& connection)
 {
+    requireSchema(connection);
     const int version = schemaVersion(connection);
-    if (version == 0)
-        throw DatabaseError(QStringLiteral("it has no tables of an image database"));
     if (version != currentSchemaVersion())
         refuse(version);
 }

@@ -15,4 +15,7 @@ void bringSchemaUpToDate(SqlConnection& connection);
 /// Throws DatabaseError unless the tables are those of this program.
 void requireCurrentSchema(SqlConnection& connection);
 
+/// Throws DatabaseError when there are no tables at all.
+void requireSchema(SqlConnection& connection);
+
 }  // namespace Kxg

@@ -33,7 +33,7 @@ const char kListSeries[] =
     "SELECT study.id, study.uid, study.patient_name, study.patient_id, study.study_date,"
     " EXISTS (SELECT 1 FROM build_request WHERE build_request.study_id = study.id AND due <= ?),"
     " series.modality, SUM(CASE WHEN file.kind = 1 AND file.is_shown = 1 THEN 1 ELSE 0 END),"
-    " SUM(CASE WHEN file.kind = 2 THEN 1 ELSE 0 END)"
+    " SUM(CASE WHEN file.kind = 2 THEN 1 ELSE 0 END), study.tag_file_size, study.tag_file_digest"
     " FROM study JOIN series ON series.study_id = study.id JOIN file ON file.series_id = series.id"
     " GROUP BY study.id, series.id ORDER BY study.uid, series.id";
 
@@ -46,24 +46,38 @@ StudySummary summaryOf(const SqlRows& rows)
     study.patientID = rows.text(3);
     study.studyDate = rows.text(4);
     study.isWaiting = rows.truth(5);
+    study.tagFile = {rows.number(9), rows.bytes(10)};
     return study;
+}
+
+std::unique_ptr<Catalogue> openWith(const QByteArray& address, SqlConnection::IfAbsent ifAbsent,
+                                    Kdd::Result& result)
+{
+    std::unique_ptr<Catalogue> catalogue;
+    DatabaseAddress parsed;
+    result = DatabaseAddress::parse(address, parsed);
+    if (result.good())
+        result = attempt(parsed, [&] { catalogue = std::make_unique<SqlCatalogue>(parsed, ifAbsent); });
+    return catalogue;
 }
 
 }  // namespace
 
 std::unique_ptr<Catalogue> Catalogue::open(const QByteArray& address, Kdd::Result& result)
 {
-    std::unique_ptr<Catalogue> catalogue;
-    DatabaseAddress parsed;
-    result = DatabaseAddress::parse(address, parsed);
-    if (result.good())
-        result = attempt(parsed, [&] { catalogue = std::make_unique<SqlCatalogue>(parsed); });
-    return catalogue;
+    return openWith(address, SqlConnection::IfAbsent::Create, result);
 }
 
-SqlCatalogue::SqlCatalogue(const DatabaseAddress& address)
-    : mConnection(address, SqlConnection::IfAbsent::Create)
+std::unique_ptr<Catalogue> Catalogue::openExisting(const QByteArray& address, Kdd::Result& result)
 {
+    return openWith(address, SqlConnection::IfAbsent::Fail, result);
+}
+
+SqlCatalogue::SqlCatalogue(const DatabaseAddress& address, SqlConnection::IfAbsent ifAbsent)
+    : mConnection(address, ifAbsent)
+{
+    if (ifAbsent == SqlConnection::IfAbsent::Fail)
+        requireSchema(mConnection);
     bringSchemaUpToDate(mConnection);
 }
 
@@ -198,9 +212,14 @@ Kdd::Result SqlCatalogue::studyContents(const QByteArray& studyUID, StudyContent
         }
         contents.isCorrected = !correctionsOf(mConnection, studyUID).empty();
         SqlRows rows =
-            mConnection.ask("SELECT tag_file_size, tag_file_digest FROM study WHERE id = ?", {studyId});
-        if (rows.next())
+            mConnection.ask("SELECT tag_file_size, tag_file_digest,"
+                            " EXISTS (SELECT 1 FROM build_request WHERE study_id = study.id AND due <= ?)"
+                            " FROM study WHERE id = ?",
+                            {presentMs(), studyId});
+        if (rows.next()) {
             contents.tagFile = {rows.number(0), rows.bytes(1)};
+            contents.isWaiting = rows.truth(2);
+        }
     });
 }
 

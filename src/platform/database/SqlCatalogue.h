@@ -11,7 +11,7 @@ class SqlCatalogue : public Catalogue
 {
 public:
     /// Throws DatabaseError.
-    explicit SqlCatalogue(const DatabaseAddress& address);
+    SqlCatalogue(const DatabaseAddress& address, SqlConnection::IfAbsent ifAbsent);
 
     Kdd::Result knownFiles(const QByteArray& path, QHash<QByteArray, FileStamp>& stamps) override;
     Kdd::Result registerFiles(const FileRecords& files, RegistrationOutcome& outcome) override;

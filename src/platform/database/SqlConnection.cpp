@@ -5,6 +5,8 @@
 #include <QSqlDatabase>
 #include <QSqlError>
 
+#include <unistd.h>
+
 #include <atomic>
 #include <filesystem>
 #include <system_error>
@@ -41,6 +43,23 @@ void provideFile(const QString& path, SqlConnection::IfAbsent ifAbsent)
         error = std::make_error_code(std::errc::no_such_file_or_directory);
     if (error)
         throw DatabaseError(QString::fromStdString(error.message()));
+}
+
+/// Whether nobody changes the file, because its folder can be read only and no process has left changes in its log.
+/// SQLite would want to make files beside it otherwise.
+bool isFixedFile(const QString& path)
+{
+    const QByteArray file = path.toUtf8();
+    const QByteArray folder = file.left(qMax(1, file.lastIndexOf('/')));
+    std::error_code error;
+    return ::access(file.constData(), R_OK) == 0 && ::access(folder.constData(), W_OK) != 0 &&
+           std::filesystem::file_size((path + QLatin1String("-wal")).toStdString(), error) + 1 <= 1;
+}
+
+QString fixedFile(const QString& path)
+{
+    return QLatin1String("file:") + QString::fromLatin1(path.toUtf8().toPercentEncoding("/")) +
+           QLatin1String("?immutable=1");
 }
 
 }  // namespace
@@ -88,12 +107,15 @@ struct SqlConnection::Opened
         : name(uniqueName())
         , database(QSqlDatabase::addDatabase(dialect.driver, name))
     {
-        database.setDatabaseName(address.database);
+        const bool isFixed =
+            address.engine == DatabaseAddress::Engine::Sqlite && isFixedFile(address.database);
+        database.setDatabaseName(isFixed ? fixedFile(address.database) : address.database);
         database.setHostName(address.host);
         database.setPort(address.port);
         database.setUserName(address.user);
         database.setPassword(address.password);
-        database.setConnectOptions(dialect.connectOptions);
+        database.setConnectOptions(isFixed ? QStringLiteral("QSQLITE_OPEN_READONLY;QSQLITE_OPEN_URI")
+                                           : dialect.connectOptions);
     }
     ~Opened()
     {

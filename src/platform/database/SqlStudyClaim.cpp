@@ -69,14 +69,22 @@ public:
     int studyId() const override { return static_cast<int>(mStudyId); }
     const QByteArray& studyInstanceUID() const override { return mStudy.uid; }
 
+    Kdd::Result noteRequests() override
+    {
+        return attempt(mConnection.address(), [this] {
+            mConnection.transact(SqlConnection::Access::Read,
+                                 [this] { mStudy.requests = requestsOf(mConnection, mStudyId); });
+        });
+    }
+
     Kdd::Result finish() override
     {
-        return conclude([] {});
+        return conclude(mStudy.requests, [] {});
     }
 
     Kdd::Result finish(const BuiltStudy& built) override
     {
-        return conclude([&] {
+        return conclude(built.isComplete ? mStudy.requests : QVector<qint64>(), [&] {
             mConnection.change("UPDATE study SET tag_file_size = ?, tag_file_digest = ? WHERE id = ?",
                                {built.tagFile.size, bytesValue(built.tagFile.digest), mStudyId});
             describe(built.series);
@@ -87,7 +95,7 @@ public:
 
     Kdd::Result finishRemoved() override
     {
-        return conclude([this] {
+        return conclude(mStudy.requests, [this] {
             mConnection.change("UPDATE study SET tag_file_size = 0, tag_file_digest = NULL WHERE id = ?",
                                {mStudyId});
             mConnection.change("DELETE FROM study WHERE id = ?"
@@ -99,12 +107,12 @@ public:
     }
 
 private:
-    Kdd::Result conclude(const std::function<void()>& work)
+    Kdd::Result conclude(const QVector<qint64>& done, const std::function<void()>& work)
     {
         return attempt(mConnection.address(), [&] {
             mLock->confirm();
             mConnection.transact(SqlConnection::Access::Write, [&] {
-                deleteRequests(mConnection, mStudy.requests);
+                deleteRequests(mConnection, done);
                 work();
             });
         });
@@ -130,7 +138,7 @@ private:
     SqlConnection& mConnection;
     const std::unique_ptr<StudyLock> mLock;
     const qint64 mStudyId;
-    const LockedStudy mStudy;
+    LockedStudy mStudy;
 };
 
 struct Request

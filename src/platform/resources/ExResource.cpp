@@ -33,6 +33,7 @@ constexpr Setting kMetaFolder = {"KDD_META_FOLDER", "folders/meta", ""};
 constexpr Setting kFileCacheFolder = {"KDD_FILE_CACHE", "folders/filecache", ""};
 constexpr Setting kTlsVerify = {"KDD_TLS_VERIFY", "tls/verify", "0"};
 constexpr Setting kTlsCaFile = {"KDD_TLS_CA_FILE", "tls/cafile", ""};
+constexpr Setting kSettleSeconds = {"KDD_SETTLE_SECONDS", "archive/settleseconds", "300"};
 constexpr Setting kShareConnections = {"KDD_SHARE_CONNECTIONS", "web/shareconnections", "1"};
 
 using Values = QHash<QString, QByteArray>;
@@ -131,6 +132,18 @@ bool ExResource::verifiesTls()
 QByteArray ExResource::tlsCaFile()
 {
     return valueOf(kTlsCaFile);
+}
+
+int ExResource::settleSeconds()
+{
+    const QByteArray value = valueOf(kSettleSeconds);
+    bool isNumber = false;
+    const int seconds = value.toInt(&isNumber);
+    if (isNumber && seconds >= 0)
+        return seconds;
+    LogFile::warnf("The setting %s is \"%s\", which is no number of seconds; %s is taken",
+                   kSettleSeconds.variable, value.constData(), kSettleSeconds.standard);
+    return QByteArray(kSettleSeconds.standard).toInt();
 }
 
 bool ExResource::sharesConnections()

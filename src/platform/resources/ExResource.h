@@ -52,6 +52,10 @@ public:
     /// that the system trusts.
     static QByteArray tlsCaFile();
 
+    /// How long after the last arrival a study that was merged is built once more [s]. KDD_SETTLE_SECONDS,
+    /// archive/settleseconds, "300".
+    static int settleSeconds();
+
     /// Whether all threads use one set of connections: not when the value is 0. KDD_SHARE_CONNECTIONS,
     /// web/shareconnections, "1".
     static bool sharesConnections();

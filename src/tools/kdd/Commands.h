@@ -15,6 +15,9 @@ struct GlobalOptions
     bool flush = false;    ///< written files are on disk before they count as written
     bool verbose = false;  ///< names everything that is passed over
     QString store;         ///< the folder of everything that is kept
+
+    /// Folder of the volume files that are made here.
+    QString volumeFolder() const { return store + QStringLiteral("/volumes"); }
 };
 
 /// How a command ends; the numbers are the exit codes.
@@ -49,6 +52,7 @@ struct BuildRequest
 {
     StudySelection selection;  ///< neither studies nor all: what waits to be built
     bool again = false;        ///< with all: also what has a tag file that nothing changed since
+    bool settle = false;       ///< also what was merged and would wait for its time
     bool optimize = true;
     int jobs = 1;
 };
@@ -64,6 +68,15 @@ struct StackRequest
 {
     StudySelection selection;
     bool again = false;  ///< also series that have volume files already
+};
+
+/// Which studies are listed; an empty text lets all pass.
+struct ListRequest
+{
+    QByteArray patient;   ///< part of the name or identifier, whatever the case
+    QByteArray date;      ///< YYYYMMDD, or a range FROM-TO with either end left out
+    QByteArray modality;  ///< one that the study has
+    bool waiting = false;
 };
 
 struct GetRequest
@@ -95,7 +108,7 @@ Outcome runSync(const GlobalOptions& options, const QByteArray& study);
 Outcome runCorrection(const GlobalOptions& options, const CorrectionRequest& request);
 Outcome runStack(const GlobalOptions& options, const StackRequest& request);
 Outcome runPreviews(const GlobalOptions& options, const PreviewsRequest& request);
-Outcome runList(const GlobalOptions& options);
+Outcome runList(const GlobalOptions& options, const ListRequest& request);
 Outcome runShow(const GlobalOptions& options, const ShowOptions& show);
 Outcome runMetadata(const GlobalOptions& options, const NodeSelection& selection);
 Outcome runStat(const GlobalOptions& options, const QByteArray& study);

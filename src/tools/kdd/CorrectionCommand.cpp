@@ -1,19 +1,15 @@
 #include "kddlib/Limits.h"
+#include "kddlib/archive/StudyChange.h"
 #include "kddlib/tagfile/QAData.h"
 #include "kddlib/tagfile/TagFile.h"
 #include "platform/base/LogFile.h"
 #include "tools/kdd/Commands.h"
-#include "tools/kdd/Database.h"
 #include "tools/kdd/Report.h"
 #include "tools/kdd/Store.h"
-#include "tools/kdd/StudyBuild.h"
 
 #include <QFile>
 
-#include <algorithm>
 #include <cstdio>
-#include <memory>
-#include <vector>
 
 namespace Kdd
 {
@@ -22,11 +18,6 @@ namespace
 {
 
 constexpr qint64 kMaxImageList = 64 * 1024 * 1024;
-
-/// Each waits 0.4 seconds, so it goes on for two minutes.
-constexpr int kAttempts = 300;
-
-using Claims = std::vector<std::unique_ptr<Kxg::StudyClaim>>;
 
 bool readFile(const QString& name, qint64 limit, QByteArray& content)
 {
@@ -87,33 +78,10 @@ bool resolveStudies(const CorrectionRequest& request, QAData& job)
     return false;
 }
 
-/// Keeps away whoever changes tag files by way of the database. In the order of the UIDs, so that two moves in opposite
-/// directions do not wait for each other.
-bool claimStudies(Kxg::Catalogue& database, const QAData& job, Claims& claims)
-{
-    QList<QByteArray> uids = {job.studyUID};
-    if (!job.oldStudyUID.isEmpty() && job.oldStudyUID != job.studyUID)
-        uids.append(job.oldStudyUID);
-    std::sort(uids.begin(), uids.end());
-    for (const QByteArray& uid : qAsConst(uids)) {
-        QVector<QByteArray> registered;
-        if (!succeeded(database.findStudies(uid, 1, registered)))
-            return false;
-        if (!registered.contains(uid))
-            continue;
-        claims.push_back(claimStudy(database, uid));
-        if (claims.back() == nullptr)
-            return false;
-    }
-    return true;
-}
-
 bool apply(QAData& job)
 {
     QString message;
-    bool isDone = TagFile::applyQA(job, message);
-    for (int i = 1; i < kAttempts && !isDone && job.outcome.isLockedOut; ++i)
-        isDone = TagFile::applyQA(job, message);
+    const bool isDone = StudyChange::correct(job, message);
     if (!isDone)
         LogFile::errorf("The correction is not made: %s", qUtf8Printable(message));
     return isDone;
@@ -148,9 +116,7 @@ Outcome runCorrection(const GlobalOptions& options, const CorrectionRequest& req
     QAData job;
     if (!readJob(request, job) || !readImages(request, job) || !resolveStudies(request, job))
         return Outcome::Failed;
-    const std::unique_ptr<Kxg::Catalogue> database = openDatabase();
-    Claims claims;
-    if (database == nullptr || !claimStudies(*database, job, claims) || !apply(job))
+    if (!apply(job))
         return Outcome::Failed;
     report(options, job);
     return job.outcome.notFound.isEmpty() ? Outcome::Done : Outcome::Failed;

@@ -9,17 +9,16 @@ namespace Kdd
 
 std::unique_ptr<Kxg::Catalogue> openDatabase()
 {
-    Result result;
-    std::unique_ptr<Kxg::Catalogue> database = Kxg::Catalogue::open(Kxg::DatabaseServer(), result);
-    succeeded(result);
-    return database;
+    return openCatalogue();
 }
 
-bool succeeded(const Result& result)
+std::unique_ptr<Kxg::Catalogue> openExistingDatabase()
 {
+    Result result;
+    std::unique_ptr<Kxg::Catalogue> database = Kxg::Catalogue::openExisting(Kxg::DatabaseServer(), result);
     if (result.bad())
-        LogFile::errorf("%s", qUtf8Printable(result.text()));
-    return result.good();
+        LogFile::errorf("There is no archive here: %s", qUtf8Printable(result.text()));
+    return database;
 }
 
 bool chooseStudies(Kxg::Catalogue& database, const QList<QByteArray>& named, bool all,

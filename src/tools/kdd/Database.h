@@ -1,17 +1,17 @@
 #pragma once
 
-#include "platform/database/Catalogue.h"
+#include "kddlib/archive/ArchiveDatabase.h"
 
 #include <memory>
 
 namespace Kdd
 {
 
-/// The image database that the command line names, opened for this thread; null, with the reason logged, on failure.
+/// The image database that the command line names, made when it is not there; null, with the reason logged, on failure.
 std::unique_ptr<Kxg::Catalogue> openDatabase();
 
-/// Logs a failure; whether the result is good.
-bool succeeded(const Result& result);
+/// The same for commands that work on what an archive has: one that is not there is a failure.
+std::unique_ptr<Kxg::Catalogue> openExistingDatabase();
 
 /// The studies that a command works on: those named (UIDs or unique beginnings), or all. False, with each fault
 /// logged, when one cannot be found.

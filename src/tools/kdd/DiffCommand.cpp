@@ -1,8 +1,8 @@
+#include "kddlib/archive/DicomInput.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
 #include "tools/kdd/AttributeDiff.h"
 #include "tools/kdd/Commands.h"
-#include "tools/kdd/DicomInput.h"
 #include "tools/kdd/Report.h"
 #include "tools/kdd/Store.h"
 
@@ -31,7 +31,7 @@ bool readNamed(const QString& name, TagFile& file)
     if (!QFileInfo(name).isFile())
         return readStudy(name.toLocal8Bit(), file);
     if (isTagFile(name))
-        return readStudyFile(name, file);
+        return readTagFile(name, file);
     const QByteArray path = name.toLocal8Bit();
     DicomInput input = readDicomInput(path);
     if (input.kind == DicomInput::Kind::Image)

@@ -1,9 +1,11 @@
+#include "kddlib/archive/FileScan.h"
+#include "kddlib/archive/Registration.h"
 #include "kddlib/tagmodel/TagMap.h"
+#include "tools/kdd/CommandProgress.h"
 #include "tools/kdd/Commands.h"
 #include "tools/kdd/Database.h"
-#include "tools/kdd/FileScan.h"
-#include "tools/kdd/Registration.h"
 #include "tools/kdd/Report.h"
+#include "tools/kdd/Store.h"
 
 #include <cstdio>
 
@@ -15,25 +17,30 @@ Outcome runIndex(const GlobalOptions& options, const QList<QByteArray>& paths)
     const std::unique_ptr<Kxg::Catalogue> database = openDatabase();
     if (database == nullptr)
         return Outcome::Failed;
-    FileScan scan(*database, options);
+    CommandProgress progress("Reading", !options.quiet);
+    FileScan scan(*database, progress);
+    scan.setOwnPlaces(ownPlaces(options));
+    scan.setNamesSkipped(options.verbose);
     Registration registration(*database);
     const bool isDone = scan.run(paths, [&](const DicomInput& input) { return registration.add(input); }) &&
                         registration.flush();
-    const int studies = registration.requests().size();
+    const int studies = registration.studies().size();
+    const int failed = static_cast<int>(scan.refused().size());
     if (options.json) {
         printJson({{QStringLiteral("studies"), studies},
                    {QStringLiteral("images"), registration.images()},
                    {QStringLiteral("volumes"), registration.volumes()},
                    {QStringLiteral("unchanged"), scan.unchanged()},
                    {QStringLiteral("skipped"), scan.skipped()},
-                   {QStringLiteral("failed"), scan.failed()}});
+                   {QStringLiteral("failed"), failed},
+                   {QStringLiteral("failures"), jsonOf(scan.refused())}});
     } else if (!options.quiet) {
         std::printf(
             "%d images and %d volumes registered in %d studies; %d files unchanged, %d skipped, %d failed\n",
-            registration.images(), registration.volumes(), studies, scan.unchanged(), scan.skipped(),
-            scan.failed());
+            registration.images(), registration.volumes(), studies, scan.unchanged(), scan.skipped(), failed);
     }
-    return isDone && scan.failed() == 0 ? Outcome::Done : Outcome::Failed;
+    const QByteArray finished = QByteArray::number(registration.images()) + " images are registered";
+    return !toldOfInterrupt(finished.constData()) && isDone && failed == 0 ? Outcome::Done : Outcome::Failed;
 }
 
 }  // namespace Kdd

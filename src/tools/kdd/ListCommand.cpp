@@ -1,8 +1,10 @@
 #include "kddlib/tagfile/TagFile.h"
+#include "platform/base/LogFile.h"
 #include "tools/kdd/Commands.h"
 #include "tools/kdd/Database.h"
 #include "tools/kdd/Report.h"
 
+#include <QDate>
 #include <QFileInfo>
 #include <QJsonArray>
 
@@ -71,17 +73,63 @@ void printList(const QList<ListedStudy>& studies)
     printTable(rows);
 }
 
+/// Days from and to, either of which may be left open.
+class DateRange
+{
+public:
+    bool parse(const QByteArray& text)
+    {
+        const int dash = text.indexOf('-');
+        mFrom = dash < 0 ? text : text.left(dash);
+        mTo = dash < 0 ? text : text.mid(dash + 1);
+        return isDay(mFrom) && isDay(mTo);
+    }
+
+    bool holds(const QByteArray& date) const
+    {
+        // Dates of one form are in the order of their texts; a study without date is in no range.
+        return (mFrom.isEmpty() && mTo.isEmpty()) ||
+               (!date.isEmpty() && date >= mFrom && (mTo.isEmpty() || date <= mTo));
+    }
+
+private:
+    static bool isDay(const QByteArray& text)
+    {
+        return text.isEmpty() ||
+               (text.size() == 8 &&
+                QDate::fromString(QString::fromLatin1(text), QStringLiteral("yyyyMMdd")).isValid());
+    }
+
+    QByteArray mFrom;
+    QByteArray mTo;
+};
+
+bool passes(const Kxg::StudySummary& study, const ListRequest& request)
+{
+    const QString patient = QString::fromUtf8(study.patientName + '\n' + study.patientID);
+    return patient.contains(QString::fromLocal8Bit(request.patient), Qt::CaseInsensitive) &&
+           (request.modality.isEmpty() || study.modalities.split(' ').contains(request.modality.toUpper())) &&
+           (!request.waiting || study.isWaiting);
+}
+
 }  // namespace
 
-Outcome runList(const GlobalOptions& options)
+Outcome runList(const GlobalOptions& options, const ListRequest& request)
 {
-    const std::unique_ptr<Kxg::Catalogue> database = openDatabase();
+    DateRange dates;
+    if (!dates.parse(request.date)) {
+        LogFile::errorf("\"%s\" is no date YYYYMMDD and no range of dates", request.date.constData());
+        return Outcome::WrongUsage;
+    }
+    const std::unique_ptr<Kxg::Catalogue> database = openExistingDatabase();
     std::vector<Kxg::StudySummary> registered;
     if (database == nullptr || !succeeded(database->listStudies(registered)))
         return Outcome::Failed;
     QList<ListedStudy> studies;
-    for (const Kxg::StudySummary& study : registered)
-        studies.append(describe(study));
+    for (const Kxg::StudySummary& study : registered) {
+        if (dates.holds(study.studyDate) && passes(study, request))
+            studies.append(describe(study));
+    }
     if (options.json)
         printJsonList(studies);
     else

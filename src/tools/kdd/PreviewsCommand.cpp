@@ -18,19 +18,19 @@ Outcome runPreviews(const GlobalOptions& options, const PreviewsRequest& request
         LogFile::errorf("Name the studies whose previews to export, or --all");
         return Outcome::WrongUsage;
     }
+    const std::unique_ptr<Kxg::Catalogue> database = openExistingDatabase();
+    QVector<QByteArray> studyUIDs;
+    if (database == nullptr)
+        return Outcome::Failed;
     if (!QDir().mkpath(request.folder)) {
         LogFile::errorf("Could not create folder %s", qUtf8Printable(request.folder));
         return Outcome::Failed;
     }
-    const std::unique_ptr<Kxg::Catalogue> database = openDatabase();
-    QVector<QByteArray> studyUIDs;
-    if (database == nullptr)
-        return Outcome::Failed;
     bool isDone = chooseStudies(*database, request.selection.studies, request.selection.all, studyUIDs);
     int exported = 0;
     for (const QByteArray& studyUID : qAsConst(studyUIDs)) {
         TagFile file;
-        if (readStudyFile(TagFile::cacheFilePathForStudy(studyUID.constData()), file))
+        if (readStudyFile(studyUID, file))
             exported += file.exportPreviews(request.folder);
         else
             isDone = false;

@@ -1,6 +1,7 @@
 #include "tools/kdd/Report.h"
 
 #include "kddlib/items/TextDecoding.h"
+#include "kddlib/tagmodel/TagMap.h"
 
 #include <QJsonDocument>
 
@@ -13,6 +14,15 @@ void printJson(const QJsonObject& object)
 {
     const QByteArray text = QJsonDocument(object).toJson(QJsonDocument::Compact);
     std::printf("%s\n", text.constData());
+}
+
+QJsonArray jsonOf(const std::vector<RefusedFile>& files)
+{
+    QJsonArray list;
+    for (const RefusedFile& file : files)
+        list.append(QJsonObject{{QStringLiteral("path"), displayText(file.path)},
+                                {QStringLiteral("reason"), withoutControls(file.reason)}});
+    return list;
 }
 
 void printTable(const QList<QStringList>& rows)

@@ -1,14 +1,22 @@
 #pragma once
 
+#include "kddlib/archive/DicomInput.h"
+
+#include <QJsonArray>
 #include <QJsonObject>
 #include <QList>
 #include <QStringList>
+
+#include <vector>
 
 namespace Kdd
 {
 
 /// Writes one JSON object and a line end to standard output.
 void printJson(const QJsonObject& object);
+
+/// [{"path":,"reason":}, ...]
+QJsonArray jsonOf(const std::vector<RefusedFile>& files);
 
 /// Writes rows with aligned columns to standard output, the first row as a heading. Columns whose heading ends in a
 /// blank are set to the right.

@@ -1,10 +1,11 @@
 #include "tools/kdd/Store.h"
 
+#include "kddlib/archive/FileWalk.h"
 #include "platform/base/LogFile.h"
+#include "platform/database/Kxg.h"
 #include "tools/kdd/Database.h"
 
 #include <QByteArrayList>
-#include <QDirIterator>
 #include <QFileInfo>
 
 namespace Kdd
@@ -18,28 +19,13 @@ constexpr int kNamesToTell = 3;
 
 }  // namespace
 
-QStringList storedTagFiles()
-{
-    QStringList paths;
-    QDirIterator files(QString::fromLocal8Bit(TagFile::metaFolder()), {QStringLiteral("*.tc")}, QDir::Files,
-                       QDirIterator::Subdirectories);
-    while (files.hasNext()) {
-        files.next();
-        // One without content is just being made.
-        if (files.fileInfo().size() > 0)
-            paths.append(files.filePath());
-    }
-    paths.sort();
-    return paths;
-}
-
 bool resolveStudy(const QByteArray& text, QByteArray& studyUID)
 {
     if (QFileInfo::exists(TagFile::cacheFilePathForStudy(text.constData()))) {
         studyUID = text;
         return true;
     }
-    const std::unique_ptr<Kxg::Catalogue> database = openDatabase();
+    const std::unique_ptr<Kxg::Catalogue> database = openExistingDatabase();
     return database != nullptr && resolveStudy(*database, text, studyUID);
 }
 
@@ -64,17 +50,42 @@ bool resolveStudy(Kxg::Catalogue& database, const QByteArray& text, QByteArray& 
 bool readStudy(const QByteArray& text, TagFile& file)
 {
     QByteArray studyUID;
-    return resolveStudy(text, studyUID) &&
-           readStudyFile(TagFile::cacheFilePathForStudy(studyUID.constData()), file);
+    return resolveStudy(text, studyUID) && readStudyFile(studyUID, file);
 }
 
-bool readStudyFile(const QString& path, TagFile& file)
+bool readStudyFile(const QByteArray& studyUID, TagFile& file)
+{
+    if (file.readCacheFileForStudy(studyUID.constData(), false))
+        return true;
+    const QString path = TagFile::cacheFilePathForStudy(studyUID.constData());
+    const QString reason = QFileInfo(path).size() == 0 && QFileInfo::exists(path)
+                               ? QStringLiteral("it is empty")
+                               : file.failure();
+    LogFile::errorf("Study %s cannot be read from %s: %s", studyUID.constData(), qUtf8Printable(path),
+                    qUtf8Printable(reason));
+    return false;
+}
+
+bool readTagFile(const QString& path, TagFile& file)
 {
     if (file.readCacheFile(path, nullptr, false))
         return true;
     if (!QFileInfo::exists(path))
         LogFile::errorf("Could not open %s: %s", qUtf8Printable(path), qUtf8Printable(file.failure()));
     return false;
+}
+
+QList<QByteArray> ownPlaces(const GlobalOptions& options)
+{
+    QList<QByteArray> places = {absolutePath(TagFile::metaFolder()),
+                                absolutePath(options.volumeFolder().toLocal8Bit())};
+    const QByteArray address = Kxg::DatabaseServer();
+    if (address.startsWith("sqlite:")) {
+        const QByteArray database = absolutePath(address.mid(7));
+        for (const char* suffix : {"", "-wal", "-shm", "-journal", ".claims"})
+            places.append(database + suffix);
+    }
+    return places;
 }
 
 }  // namespace Kdd

@@ -2,15 +2,13 @@
 
 #include "kddlib/tagfile/TagFile.h"
 #include "platform/database/Catalogue.h"
+#include "tools/kdd/Commands.h"
 
 #include <QByteArray>
-#include <QStringList>
+#include <QList>
 
 namespace Kdd
 {
-
-/// Paths of all tag files below the meta folder, sorted.
-QStringList storedTagFiles();
 
 /// Finds the study whose UID is `text` or, if that names none, begins with it. On failure (none, or several) the
 /// reason is logged. The database is asked only when `text` is not the UID of a tag file.
@@ -20,7 +18,13 @@ bool resolveStudy(Kxg::Catalogue& database, const QByteArray& text, QByteArray& 
 /// Reads the study that `text` names; failures are logged.
 bool readStudy(const QByteArray& text, TagFile& file);
 
-/// The last error of reading a file is told here when the library itself has not logged it, as for an absent file.
-bool readStudyFile(const QString& path, TagFile& file);
+/// The study's tag file; one that holds another study is refused. Failures are logged.
+bool readStudyFile(const QByteArray& studyUID, TagFile& file);
+
+/// The same for a tag file that is named by its path, whatever study it holds.
+bool readTagFile(const QString& path, TagFile& file);
+
+/// What the archive keeps itself and must not take in: tag files, volume files, the database.
+QList<QByteArray> ownPlaces(const GlobalOptions& options);
 
 }  // namespace Kdd

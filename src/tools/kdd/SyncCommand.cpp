@@ -1,9 +1,9 @@
-#include "platform/base/LogFile.h"
+#include "kddlib/archive/StudyChange.h"
+#include "kddlib/tagfile/TagFile.h"
 #include "tools/kdd/Commands.h"
 #include "tools/kdd/Database.h"
 #include "tools/kdd/Report.h"
 #include "tools/kdd/Store.h"
-#include "tools/kdd/StudyBuild.h"
 
 #include <cstdio>
 
@@ -12,20 +12,12 @@ namespace Kdd
 
 Outcome runSync(const GlobalOptions& options, const QByteArray& study)
 {
-    const std::unique_ptr<Kxg::Catalogue> database = openDatabase();
+    const std::unique_ptr<Kxg::Catalogue> database = openExistingDatabase();
     QByteArray studyUID;
-    if (database == nullptr || !resolveStudy(*database, study, studyUID))
-        return Outcome::Failed;
-    // Nobody else may change the file between its reading and its writing.
-    const std::unique_ptr<Kxg::StudyClaim> claim = claimStudy(*database, studyUID);
     TagFile file;
-    if (claim == nullptr || !file.readAndSync(studyUID.constData(), nullptr))
+    if (database == nullptr || !resolveStudy(*database, study, studyUID) ||
+        !StudyChange(*database).synchronise(studyUID, file))
         return Outcome::Failed;
-    file.optimizeAll();
-    if (!file.writeCacheFile()) {
-        LogFile::errorf("Study %s is not changed: %s", studyUID.constData(), qUtf8Printable(file.failure()));
-        return Outcome::Failed;
-    }
     const TagFile::Statistics statistics = file.statistics();
     if (options.json) {
         printJson(

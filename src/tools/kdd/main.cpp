@@ -3,6 +3,7 @@
 #include "platform/base/LogFile.h"
 #include "platform/database/Kxg.h"
 #include "platform/resources/ExResource.h"
+#include "tools/kdd/CommandProgress.h"
 #include "tools/kdd/Commands.h"
 
 #include <QStandardPaths>
@@ -186,10 +187,12 @@ private:
                          [this] { return runIndex(mGlobal, paths()); }));
         CLI::App& build =
             declare("build", "Build the tag files of studies that wait for it, or of those named", [this] {
-                return runBuild(mGlobal, {studies(), mAgain, !mNoOptimize, mJobs});
+                return runBuild(mGlobal, {studies(), mAgain, mSettle, !mNoOptimize, mJobs});
             });
         addStudies(build);
         build.add_flag("--again", mAgain, "With --all: also those whose files did not change");
+        build.add_flag("--settle", mSettle,
+                       "Also studies that images were merged into lately, without waiting");
         build.add_flag("--no-optimize", mNoOptimize, "Leave every attribute where it was found");
         build.add_option("--jobs", mJobs, "Studies built at once")->check(CLI::Range(1, 256));
         CLI::App& stack = declare("stack", "Make volume files from the series that can be stacked", [this] {
@@ -241,7 +244,14 @@ private:
             ->required();
         previews.add_flag("--all", mAll, "Every study; then name the folder only");
         previews.add_option("--sheet", mFolder, "Also put all pictures of the folder into this one picture");
-        declare("list", "List the studies", [this] { return runList(mGlobal); });
+        CLI::App& list = declare("list", "List the studies", [this] {
+            return runList(mGlobal, {bytes(mPatient), bytes(mDate), bytes(mModality), mWaiting});
+        });
+        list.add_option("--patient", mPatient,
+                        "Only those whose patient's name or identifier has this in it");
+        list.add_option("--date", mDate, "Only those of this date, YYYYMMDD, or of a range FROM-TO");
+        list.add_option("--modality", mModality, "Only those with a series of this modality");
+        list.add_flag("--waiting", mWaiting, "Only those that wait to be built");
         CLI::App& show = declare("show", "Show the attributes of a node", [this] {
             return runShow(mGlobal, {mNode.selection(), mOwn, mTree});
         });
@@ -303,11 +313,16 @@ private:
     unsigned mSeed = 1;
     bool mOwn = false;
     bool mTree = false;
+    std::string mPatient;
+    std::string mDate;
+    std::string mModality;
+    bool mWaiting = false;
     std::string mLeft;
     std::string mRight;
     std::vector<std::string> mStudies;
     bool mAll = false;
     bool mAgain = false;
+    bool mSettle = false;
     bool mNoOptimize = false;
     int mJobs = 1;
 };
@@ -332,6 +347,7 @@ Outcome run(int argc, char** argv)
     }
     applyLogging(global);
     applyStore(global, store);
+    CommandProgress::catchInterrupts();
     return whenWritten(chosen());
 }
 

@@ -1,5 +1,5 @@
 #include "CatalogueFixture.h"
-#include "kddlib/capi/TagFileRemoval.h"
+#include "kddlib/tagfile/TagFileRemoval.h"
 #include "kddlib/capi/kddtagfile.h"
 #include "kddlib/tagfile/TagFile.h"
 #include "platform/base/LogFile.h"

@@ -1,5 +1,5 @@
 #include "kddlib/capi/Border.h"
-#include "kddlib/capi/TagFileRemoval.h"
+#include "kddlib/tagfile/TagFileRemoval.h"
 #include "kddlib/capi/kddtagfile.h"
 #include "kddlib/tagfile/TagFile.h"
 #include "platform/base/LogFile.h"

@@ -151,6 +151,7 @@ public:
         int uncompressedSize = 0;
         int unoptimisedSize = 0;  ///< before optimisation, uncompressed; only with `kMeasureUnoptimised`
         int blobBytes = 0;
+        int missingBlobs = 0;  ///< of those that the file read last promised, cut off at its end
     };
 
     Statistics statistics() const;

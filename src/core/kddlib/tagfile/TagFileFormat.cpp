@@ -69,9 +69,9 @@ QByteArray readAtMost(QDataStream& in, qint64 wanted)
     return bytes;
 }
 
-QList<QByteArray> readBlobs(QDataStream& in)
+QList<QByteArray> readBlobs(QDataStream& in, qint32& count)
 {
-    qint32 count = 0;
+    count = 0;
     in >> count;
     QList<QByteArray> blobs;
     for (qint32 i = 0; i < count && !in.atEnd(); ++i) {
@@ -313,6 +313,7 @@ bool TagFile::readCacheFile(QDataStream& in, const char* studyUID)
         return failReading(kUnsupportedVersion);
     QByteArray stored;
     QList<QByteArray> blobs;
+    qint32 promised = 0;
     if (header.layout == kOldLayout) {
         stored = readAtMost(in, kMaxStoredBody);
     } else {
@@ -321,12 +322,16 @@ bool TagFile::readCacheFile(QDataStream& in, const char* studyUID)
         stored = readAtMost(in, qMin<qint64>(size, kMaxStoredBody));
         if (in.status() != QDataStream::Ok || size < 0 || stored.size() < size)
             return failReading(kTruncated);
-        blobs = readBlobs(in);
+        blobs = readBlobs(in, promised);
     }
     QByteArray body;
     if (!uncompress(stored, header.compression, body))
         return failReading(kUnsupportedCompression);
     recordSizes(stored.size(), body.size(), blobs);
+    mStatistics.missingBlobs = qMax(0, promised - blobs.size());
+    if (mStatistics.missingBlobs > 0 && LogFile::debugLogging())
+        LogFile::printf("%s ends early: %d of %d previews are missing", qUtf8Printable(mCacheFilePath),
+                        mStatistics.missingBlobs, promised);
     if (body.size() > kMaxBodySize || !BodyReader(*this, studyUID, blobs).read(KxMsg(body))) {
         clear();
         return failReading(kDamaged);

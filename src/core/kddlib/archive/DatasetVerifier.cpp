@@ -1,10 +1,9 @@
-#include "tools/kdd/DatasetVerifier.h"
+#include "kddlib/archive/DatasetVerifier.h"
 
 #include "kddlib/Limits.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/tagmodel/TagSequence.h"
-#include "tools/kdd/AttributeText.h"
 
 #include <dcmtk/dcmdata/dctk.h>
 
@@ -15,6 +14,11 @@ namespace
 {
 
 using Report = std::function<void(const QByteArray&, const QByteArray&)>;
+
+QByteArray keyText(const DcmTagKey& key)
+{
+    return QString::asprintf("(%04x,%04x)", unsigned(key.getGroup()), unsigned(key.getElement())).toLatin1();
+}
 
 bool isKept(const DcmTagKey& key)
 {

@@ -1,11 +1,12 @@
-#include "tools/kdd/FileScan.h"
+#include "kddlib/archive/FileScan.h"
 
+#include "kddlib/archive/ArchiveDatabase.h"
+#include "kddlib/archive/FileWalk.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
 #include "platform/os/FileStatus.h"
-#include "tools/kdd/Database.h"
-#include "tools/kdd/Progress.h"
 
+#include <algorithm>
 #include <deque>
 #include <future>
 #include <thread>
@@ -29,39 +30,36 @@ std::vector<DicomInput> readSome(const QList<QByteArray>& paths)
     return inputs;
 }
 
+}  // namespace
+
+bool FileScan::run(const QList<QByteArray>& paths, const std::function<bool(DicomInput)>& take)
+{
+    QList<QByteArray> files;
+    return findChanged(paths, files) && readAll(files, take);
+}
+
 /// Reads the files on as many threads as there are cores and hands them on in their order.
-bool readAll(const QList<QByteArray>& files, const std::function<bool(DicomInput)>& take)
+bool FileScan::readAll(const QList<QByteArray>& files, const std::function<bool(DicomInput)>& take)
 {
     const unsigned ahead = qMax(1U, std::thread::hardware_concurrency());
     std::deque<std::future<std::vector<DicomInput>>> running;
     int next = 0;
+    qint64 done = 0;
     while (next < files.size() || !running.empty()) {
         while (next < files.size() && running.size() <= ahead) {
             running.push_back(std::async(std::launch::async, readSome, files.mid(next, kFilesPerTask)));
             next += kFilesPerTask;
         }
         for (DicomInput& input : running.front().get()) {
-            if (!take(std::move(input)))
+            if (mObserver.isCancelled())
+                return true;
+            if (!handOn(std::move(input), take))
                 return false;
+            mObserver.progress(++done, files.size());
         }
         running.pop_front();
     }
     return true;
-}
-
-}  // namespace
-
-bool FileScan::run(const QList<QByteArray>& paths, const std::function<bool(DicomInput)>& take)
-{
-    QList<QByteArray> files;
-    if (!findChanged(paths, files))
-        return false;
-    Progress progress("Reading", !mOptions.quiet);
-    qint64 done = 0;
-    return readAll(files, [&](DicomInput input) {
-        progress.show(++done, files.size());
-        return handOn(std::move(input), take);
-    });
 }
 
 bool FileScan::findChanged(const QList<QByteArray>& paths, QList<QByteArray>& changed)
@@ -71,12 +69,14 @@ bool FileScan::findChanged(const QList<QByteArray>& paths, QList<QByteArray>& ch
         const QList<QByteArray> files = filesBelow({path}, faults);
         for (const QString& fault : qAsConst(faults)) {
             LogFile::errorf("Could not look into %s", qUtf8Printable(fault));
-            ++mFailed;
+            mRefused.push_back({path, fault});
         }
         QHash<QByteArray, Kxg::FileStamp> known;
-        if (!succeeded(mDatabase.knownFiles(absolutePath(path), known)))
+        if (!succeeded(mCatalogue.knownFiles(absolutePath(path), known)))
             return false;
         for (const QByteArray& file : files) {
+            if (isOwn(file))
+                continue;
             const auto stamp = known.constFind(file);
             FileStatus status;
             if (stamp != known.cend() && statusOf(file.constData(), status) && status.size == stamp->size &&
@@ -89,6 +89,13 @@ bool FileScan::findChanged(const QList<QByteArray>& paths, QList<QByteArray>& ch
     return true;
 }
 
+bool FileScan::isOwn(const QByteArray& file) const
+{
+    return std::any_of(mOwnPlaces.begin(), mOwnPlaces.end(), [&](const QByteArray& place) {
+        return file == place || (file.startsWith(place) && file.at(place.size()) == '/');
+    });
+}
+
 bool FileScan::handOn(DicomInput input, const std::function<bool(DicomInput)>& take)
 {
     switch (input.kind) {
@@ -97,12 +104,12 @@ bool FileScan::handOn(DicomInput input, const std::function<bool(DicomInput)>& t
         break;
     case DicomInput::Kind::Other:
         ++mSkipped;
-        if (mOptions.verbose)
+        if (mNamesSkipped)
             LogFile::printf("Skipped %s: %s", input.path.constData(), qUtf8Printable(input.reason));
         break;
     case DicomInput::Kind::Unusable:
-        ++mFailed;
         LogFile::errorf("Could not take %s: %s", input.path.constData(), qUtf8Printable(input.reason));
+        mRefused.push_back({input.path, input.reason});
         return true;
     }
     return take(std::move(input));

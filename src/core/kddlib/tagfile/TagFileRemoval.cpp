@@ -1,4 +1,4 @@
-#include "kddlib/capi/TagFileRemoval.h"
+#include "kddlib/tagfile/TagFileRemoval.h"
 
 #include "platform/base/LogFile.h"
 #include "platform/os/ExclusiveFile.h"

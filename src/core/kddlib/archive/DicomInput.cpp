@@ -1,4 +1,4 @@
-#include "tools/kdd/DicomInput.h"
+#include "kddlib/archive/DicomInput.h"
 
 #include "kddlib/Limits.h"
 #include "kddlib/net/DicomFileReader.h"
@@ -12,9 +12,6 @@
 
 #include <algorithm>
 #include <cstring>
-#include <filesystem>
-#include <system_error>
-#include <vector>
 
 namespace Kdd
 {
@@ -113,6 +110,13 @@ DicomInput& take(DicomInput& input, DcmFileFormat& file)
     }
     input.studyUID = input.map->uid(TagMap::StudyLevel);
     input.seriesUID = input.map->uid(TagMap::SeriesLevel);
+    // Together in a study without a name, or a series, the images of two patients would meet.
+    if (input.studyUID.isEmpty() || input.seriesUID.isEmpty()) {
+        input.map.reset();
+        return refuse(input, DicomInput::Kind::Unusable,
+                      input.studyUID.isEmpty() ? QStringLiteral("It has no Study Instance UID")
+                                               : QStringLiteral("It has no Series Instance UID"));
+    }
     input.kind = DicomInput::Kind::Image;
     return input;
 }
@@ -130,46 +134,6 @@ DicomInput& takeVolume(DicomInput& input)
         return refuse(input, DicomInput::Kind::Unusable, QStringLiteral("It names no study and series"));
     input.kind = DicomInput::Kind::Volume;
     return input;
-}
-
-QByteArray bytes(const std::filesystem::path& path)
-{
-    return QByteArray::fromStdString(path.native());
-}
-
-QString fault(const std::filesystem::path& path, const std::error_code& error)
-{
-    return QStringLiteral("%1: %2").arg(QString::fromLocal8Bit(bytes(path)),
-                                        QString::fromStdString(error.message()));
-}
-
-void collect(const std::filesystem::path& place, QList<QByteArray>& files, QStringList& faults);
-
-void collectBelow(const std::filesystem::path& folder, QList<QByteArray>& files, QStringList& faults)
-{
-    std::error_code error;
-    std::vector<std::filesystem::path> entries;
-    for (std::filesystem::directory_iterator it(folder, error), end; !error && it != end; it.increment(error))
-        entries.push_back(it->path());
-    if (error)
-        faults.append(fault(folder, error));
-    std::sort(entries.begin(), entries.end());
-    for (const std::filesystem::path& entry : entries) {
-        // A linked folder may lead back up; linked files are welcome.
-        if (!std::filesystem::is_symlink(entry, error) || !std::filesystem::is_directory(entry, error))
-            collect(entry, files, faults);
-    }
-}
-
-/// Pipes, sockets and devices are no files; a link that leads nowhere is taken for one, so that its reading tells.
-void collect(const std::filesystem::path& place, QList<QByteArray>& files, QStringList& faults)
-{
-    std::error_code error;
-    const std::filesystem::file_status status = std::filesystem::status(place, error);
-    if (std::filesystem::is_directory(status))
-        collectBelow(place, files, faults);
-    else if (!std::filesystem::is_other(status))
-        files.append(absolutePath(bytes(place)));
 }
 
 }  // namespace
@@ -206,29 +170,6 @@ DicomInput readDicomInput(const QByteArray& path)
     if (isMediaDirectory(format))
         return std::move(refuse(input, DicomInput::Kind::Other, QStringLiteral("Media directory")));
     return std::move(take(input, format));
-}
-
-QByteArray absolutePath(const QByteArray& path)
-{
-    QByteArray absolute = bytes(std::filesystem::absolute(path.toStdString()).lexically_normal());
-    if (absolute.size() > 1 && absolute.endsWith('/'))
-        absolute.chop(1);
-    return absolute;
-}
-
-QList<QByteArray> filesBelow(const QList<QByteArray>& paths, QStringList& faults)
-{
-    QList<QByteArray> files;
-    for (const QByteArray& path : paths) {
-        const std::filesystem::path place(path.toStdString());
-        std::error_code error;
-        if (std::filesystem::exists(std::filesystem::symlink_status(place, error)))
-            collect(place, files, faults);
-        else
-            faults.append(
-                fault(place, error ? error : std::make_error_code(std::errc::no_such_file_or_directory)));
-    }
-    return files;
 }
 
 }  // namespace Kdd

@@ -1,11 +1,10 @@
 #pragma once
 
+#include "platform/base/Export.h"
 #include "platform/database/Catalogue.h"
 
 #include <QByteArray>
-#include <QList>
 #include <QString>
-#include <QStringList>
 
 #include <memory>
 
@@ -14,8 +13,15 @@ namespace Kdd
 
 class TagMap;
 
+/// A file that was not taken, and why.
+struct RefusedFile
+{
+    QByteArray path;
+    QString reason;
+};
+
 /// What became of one file that was offered.
-struct DicomInput
+struct KDD_EXPORT DicomInput
 {
     enum class Kind {
         Image,     ///< `map` holds it
@@ -40,16 +46,9 @@ struct DicomInput
     ~DicomInput();
 };
 
-/// Reads one file: of an image its attributes, of a volume file its header. Media directories (DICOMDIR) count as not DICOM: they describe files, not patients. May be called
-/// on several threads at once.
-DicomInput readDicomInput(const QByteArray& path);
-
-/// The files at and below the paths, absolute and sorted within each folder. Paths that do not exist and folders that
-/// cannot be entered are put into `faults` with the reason. Paths are bytes: a name that is no text in the present
-/// locale is a file like any other.
-QList<QByteArray> filesBelow(const QList<QByteArray>& paths, QStringList& faults);
-
-/// The path as `filesBelow` gives it.
-QByteArray absolutePath(const QByteArray& path);
+/// Reads one file: of an image its attributes, of a volume file its header. Media directories (DICOMDIR) count as not
+/// DICOM: they describe files, not patients. An object that names no study or series is unusable. May be called on
+/// several threads at once.
+KDD_EXPORT DicomInput readDicomInput(const QByteArray& path);
 
 }  // namespace Kdd

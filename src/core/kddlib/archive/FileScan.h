@@ -1,0 +1,57 @@
+#pragma once
+
+#include "kddlib/archive/DicomInput.h"
+#include "kddlib/archive/WorkObserver.h"
+#include "platform/database/Catalogue.h"
+
+#include <QList>
+
+#include <functional>
+#include <vector>
+
+namespace Kdd
+{
+
+/// Looks through files and folders for what the catalogue does not know yet, or knows otherwise: files whose path, size
+/// and time of change are known are not opened. The archive's own files are passed over.
+class KDD_EXPORT FileScan
+{
+public:
+    /// Both must outlive the object.
+    FileScan(Kxg::Catalogue& catalogue, WorkObserver& observer)
+        : mCatalogue(catalogue)
+        , mObserver(observer)
+    {
+    }
+
+    /// Folders and files that the archive keeps itself, absolute.
+    void setOwnPlaces(const QList<QByteArray>& places) { mOwnPlaces = places; }
+
+    /// Files that are no images are named in the log.
+    void setNamesSkipped(bool names) { mNamesSkipped = names; }
+
+    /// Reads the files at and below the paths, several at a time, and hands on what each one is in their order until
+    /// `take` returns false or the observer cancels. Files that cannot be read are logged and refused instead. False
+    /// when the database failed or `take` ended it.
+    bool run(const QList<QByteArray>& paths, const std::function<bool(DicomInput)>& take);
+
+    int unchanged() const { return mUnchanged; }
+    int skipped() const { return mSkipped; }
+    const std::vector<RefusedFile>& refused() const { return mRefused; }
+
+private:
+    bool findChanged(const QList<QByteArray>& paths, QList<QByteArray>& changed);
+    bool isOwn(const QByteArray& file) const;
+    bool readAll(const QList<QByteArray>& files, const std::function<bool(DicomInput)>& take);
+    bool handOn(DicomInput input, const std::function<bool(DicomInput)>& take);
+
+    Kxg::Catalogue& mCatalogue;
+    WorkObserver& mObserver;
+    QList<QByteArray> mOwnPlaces;
+    bool mNamesSkipped = false;
+    int mUnchanged = 0;
+    int mSkipped = 0;
+    std::vector<RefusedFile> mRefused;
+};
+
+}  // namespace Kdd

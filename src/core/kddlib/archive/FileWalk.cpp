@@ -1,0 +1,79 @@
+#include "kddlib/archive/FileWalk.h"
+
+#include <algorithm>
+#include <filesystem>
+#include <system_error>
+#include <vector>
+
+namespace Kdd
+{
+
+namespace
+{
+
+QByteArray bytes(const std::filesystem::path& path)
+{
+    return QByteArray::fromStdString(path.native());
+}
+
+QString fault(const std::filesystem::path& path, const std::error_code& error)
+{
+    return QStringLiteral("%1: %2").arg(QString::fromLocal8Bit(bytes(path)),
+                                        QString::fromStdString(error.message()));
+}
+
+void collect(const std::filesystem::path& place, QList<QByteArray>& files, QStringList& faults);
+
+void collectBelow(const std::filesystem::path& folder, QList<QByteArray>& files, QStringList& faults)
+{
+    std::error_code error;
+    std::vector<std::filesystem::path> entries;
+    for (std::filesystem::directory_iterator it(folder, error), end; !error && it != end; it.increment(error))
+        entries.push_back(it->path());
+    if (error)
+        faults.append(fault(folder, error));
+    std::sort(entries.begin(), entries.end());
+    for (const std::filesystem::path& entry : entries) {
+        // A linked folder may lead back up; linked files are welcome.
+        if (!std::filesystem::is_symlink(entry, error) || !std::filesystem::is_directory(entry, error))
+            collect(entry, files, faults);
+    }
+}
+
+/// Pipes, sockets and devices are no files; a link that leads nowhere is taken for one, so that its reading tells.
+void collect(const std::filesystem::path& place, QList<QByteArray>& files, QStringList& faults)
+{
+    std::error_code error;
+    const std::filesystem::file_status status = std::filesystem::status(place, error);
+    if (std::filesystem::is_directory(status))
+        collectBelow(place, files, faults);
+    else if (!std::filesystem::is_other(status))
+        files.append(absolutePath(bytes(place)));
+}
+
+}  // namespace
+
+QByteArray absolutePath(const QByteArray& path)
+{
+    QByteArray absolute = bytes(std::filesystem::absolute(path.toStdString()).lexically_normal());
+    if (absolute.size() > 1 && absolute.endsWith('/'))
+        absolute.chop(1);
+    return absolute;
+}
+
+QList<QByteArray> filesBelow(const QList<QByteArray>& paths, QStringList& faults)
+{
+    QList<QByteArray> files;
+    for (const QByteArray& path : paths) {
+        const std::filesystem::path place(path.toStdString());
+        std::error_code error;
+        if (std::filesystem::exists(std::filesystem::symlink_status(place, error)))
+            collect(place, files, faults);
+        else
+            faults.append(
+                fault(place, error ? error : std::make_error_code(std::errc::no_such_file_or_directory)));
+    }
+    return files;
+}
+
+}  // namespace Kdd

@@ -1,0 +1,22 @@
+#pragma once
+
+#include "platform/base/Export.h"
+
+#include <QByteArray>
+#include <QList>
+#include <QStringList>
+
+namespace Kdd
+{
+
+// Finding files. Paths are bytes: a name that is no text in the present locale is a file like any other.
+
+/// The files at and below the paths, absolute and sorted within each folder. Paths that do not exist and folders that
+/// cannot be entered are put into `faults` with the reason. Folders of links are not entered, since they may lead back
+/// up.
+KDD_EXPORT QList<QByteArray> filesBelow(const QList<QByteArray>& paths, QStringList& faults);
+
+/// The path as `filesBelow` gives it.
+KDD_EXPORT QByteArray absolutePath(const QByteArray& path);
+
+}  // namespace Kdd

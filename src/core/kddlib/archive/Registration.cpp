@@ -1,0 +1,76 @@
+#include "kddlib/archive/Registration.h"
+
+#include "kddlib/archive/ArchiveDatabase.h"
+#include "kddlib/archive/DicomInput.h"
+#include "kddlib/tagfile/StudyRecord.h"
+#include "kddlib/tagmodel/TagMap.h"
+#include "platform/base/LogFile.h"
+
+namespace Kdd
+{
+
+namespace
+{
+
+constexpr std::size_t kBatch = 1000;
+
+void warnOf(const Kxg::FileConflict& conflict)
+{
+    const char* path = conflict.path.constData();
+    const char* other = conflict.otherPath.constData();
+    switch (conflict.kind) {
+    case Kxg::FileConflict::Kind::Replaces:
+        LogFile::warnf("%s replaces %s: both are files of image %s", path, other,
+                       conflict.sopInstanceUID.constData());
+        break;
+    case Kxg::FileConflict::Kind::AlsoInOtherStudy:
+        LogFile::warnf("Image %s stands in two studies: in %s (%s) and in %s (%s)",
+                       conflict.sopInstanceUID.constData(), conflict.studyInstanceUID.constData(), path,
+                       conflict.otherStudyUID.constData(), other);
+        break;
+    case Kxg::FileConflict::Kind::FollowsCorrection:
+        LogFile::warnf("%s names study %s, but goes to study %s: a correction moved its image there", path,
+                       conflict.studyInstanceUID.constData(), conflict.otherStudyUID.constData());
+        break;
+    }
+}
+
+}  // namespace
+
+bool Registration::add(const DicomInput& input)
+{
+    switch (input.kind) {
+    case DicomInput::Kind::Image:
+        mBatch.dicom.push_back(fileRecord(*input.map, input.path, input.stamp));
+        break;
+    case DicomInput::Kind::Volume:
+        mBatch.volumes.push_back({input.path, input.stamp, input.studyUID, input.seriesUID});
+        break;
+    case DicomInput::Kind::Other:
+        mBatch.others.push_back({input.path, input.stamp});
+        break;
+    case DicomInput::Kind::Unusable:
+        // It is read again the next time, when it may have been mended.
+        return true;
+    }
+    return mBatch.dicom.size() + mBatch.volumes.size() + mBatch.others.size() < kBatch || flush();
+}
+
+bool Registration::flush()
+{
+    if (mBatch.dicom.empty() && mBatch.volumes.empty() && mBatch.others.empty())
+        return true;
+    Kxg::RegistrationOutcome outcome;
+    if (!succeeded(mCatalogue.registerFiles(mBatch, outcome)))
+        return false;
+    for (auto it = outcome.requests.cbegin(); it != outcome.requests.cend(); ++it)
+        mStudies.insert(it.key());
+    for (const Kxg::FileConflict& conflict : outcome.conflicts)
+        warnOf(conflict);
+    mImages += static_cast<int>(mBatch.dicom.size());
+    mVolumes += static_cast<int>(mBatch.volumes.size());
+    mBatch = {};
+    return true;
+}
+
+}  // namespace Kdd

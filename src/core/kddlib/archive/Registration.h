@@ -1,0 +1,42 @@
+#pragma once
+
+#include "platform/base/Export.h"
+#include "platform/database/Catalogue.h"
+
+namespace Kdd
+{
+
+struct DicomInput;
+
+/// Registers files in batches: one transaction for each file would make the database the slowest part by far. Files that
+/// stand in each other's way, and those that a correction leads elsewhere, are warned about by name.
+class KDD_EXPORT Registration
+{
+public:
+    /// The catalogue must outlive the object.
+    explicit Registration(Kxg::Catalogue& catalogue)
+        : mCatalogue(catalogue)
+    {
+    }
+
+    /// False when the database failed, which is logged.
+    bool add(const DicomInput& input);
+
+    /// Registers what is still waiting for a full batch.
+    bool flush();
+
+    /// The studies that registered files belong to or were taken from.
+    const QSet<QByteArray>& studies() const { return mStudies; }
+
+    int images() const { return mImages; }
+    int volumes() const { return mVolumes; }
+
+private:
+    Kxg::Catalogue& mCatalogue;
+    Kxg::FileRecords mBatch;
+    QSet<QByteArray> mStudies;
+    int mImages = 0;
+    int mVolumes = 0;
+};
+
+}  // namespace Kdd

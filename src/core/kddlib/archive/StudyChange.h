@@ -1,0 +1,53 @@
+#pragma once
+
+#include "platform/base/Export.h"
+#include "platform/database/Catalogue.h"
+
+#include <QString>
+
+namespace Kdd
+{
+
+class TagFile;
+struct QAData;
+
+/// A study, or one of its series or images.
+struct ArchiveNode
+{
+    QByteArray study;   ///< Study Instance UID
+    QByteArray series;  ///< Series Instance UID, or empty
+    QByteArray image;   ///< SOP Instance UID, the path of an image without one, or empty
+};
+
+/// Changes of what the archive holds: removals, corrections, bringing a tag file into line with the database. Each waits
+/// for whoever works on the study, and goes through to its end under one claim.
+class KDD_EXPORT StudyChange
+{
+public:
+    /// The catalogue must outlive the object.
+    explicit StudyChange(Kxg::Catalogue& catalogue)
+        : mCatalogue(catalogue)
+    {
+    }
+
+    /// Removes a node for good; its files stay where they are, and come back only when they are taken in again. The
+    /// catalogue forgets it first, so that a process that dies in between leaves a study that waits to be completed, and
+    /// a repeat completes it. False when there is no such node or when it is not removed; the reason is logged.
+    bool remove(const ArchiveNode& node);
+
+    /// Applies a correction, trying again for some minutes while others hold the tag files. False, with the reason in
+    /// `message`, as `TagFile::applyQA`.
+    static bool correct(QAData& job, QString& message);
+
+    /// Brings the tag file into line with the database without opening files: paths, names of volumes, what is not
+    /// listed any more. `file` holds the study afterwards. False when it cannot be read or written, which is logged.
+    bool synchronise(const QByteArray& studyUID, TagFile& file);
+
+private:
+    bool removeRegistered(const ArchiveNode& node);
+    bool forget(const ArchiveNode& node);
+
+    Kxg::Catalogue& mCatalogue;
+};
+
+}  // namespace Kdd

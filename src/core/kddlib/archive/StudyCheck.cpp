@@ -1,0 +1,240 @@
+#include "kddlib/archive/StudyCheck.h"
+
+#include "kddlib/archive/ArchiveDatabase.h"
+#include "kddlib/archive/DatasetVerifier.h"
+#include "kddlib/archive/WorkObserver.h"
+#include "kddlib/net/DicomFileReader.h"
+#include "kddlib/tagfile/StudyRecord.h"
+#include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
+#include "kddlib/tagmodel/TagMap.h"
+#include "kddlib/volumes/Volume.h"
+
+#include <QDirIterator>
+#include <QFileInfo>
+#include <QSet>
+
+#include <dcmtk/dcmdata/dcfilefo.h>
+
+#include <utility>
+
+namespace Kdd
+{
+
+namespace
+{
+
+QString textOf(const QByteArray& bytes)
+{
+    return QString::fromLocal8Bit(bytes);
+}
+
+/// Why a study's tag file cannot be read, more plainly than the reader can tell.
+QString reasonOf(const QString& path, const TagFile& tried)
+{
+    const QFileInfo info(path);
+    if (!info.exists())
+        return QStringLiteral("has no tag file");
+    if (info.size() == 0)
+        return QStringLiteral("has an empty tag file, %1").arg(path);
+    TagFile any;
+    if (any.readCacheFile(path, nullptr, false))
+        return QStringLiteral("has a tag file, %1, that holds study %2")
+            .arg(path, textOf(any.studyInstanceUID()));
+    return QStringLiteral("has a tag file, %1, that cannot be read: %2").arg(path, tried.failure());
+}
+
+QByteArray baseName(const QByteArray& path)
+{
+    return path.mid(path.lastIndexOf('/') + 1);
+}
+
+/// By what volumes are known in a tag file: the end of their file's name, or all of it after a sync.
+bool isVolumeOf(const QByteArray& fileName, const QByteArray& path)
+{
+    const QByteArray base = baseName(path);
+    return fileName == base || fileName == Volume::fileNameSuffix(base);
+}
+
+}  // namespace
+
+StudyCheck::StudyCheck(Kxg::Catalogue& catalogue, WorkObserver& observer,
+                       std::function<void(const QString&)> report)
+    : mCatalogue(catalogue)
+    , mObserver(observer)
+    , mReport(std::move(report))
+{
+}
+
+void StudyCheck::fault(const QString& text)
+{
+    ++mFindings.differences;
+    mReport(text);
+}
+
+void StudyCheck::checkAll()
+{
+    std::vector<Kxg::StudySummary> studies;
+    if (!succeeded(mCatalogue.listStudies(studies))) {
+        ++mFindings.unreadable;
+        return;
+    }
+    QSet<QString> known;
+    for (const Kxg::StudySummary& study : studies) {
+        if (mObserver.isCancelled())
+            return;
+        check(study.studyInstanceUID);
+        known.insert(TagFile::cacheFilePathForStudy(study.studyInstanceUID.constData()));
+    }
+    QStringList others;
+    QDirIterator files(QString::fromLocal8Bit(TagFile::metaFolder()), {QStringLiteral("*.tc")}, QDir::Files,
+                       QDirIterator::Subdirectories);
+    while (files.hasNext()) {
+        const QString path = files.next();
+        if (!known.contains(path))
+            others.append(path);
+    }
+    others.sort();
+    for (const QString& path : qAsConst(others)) {
+        if (!mObserver.isCancelled())
+            checkUnknown(path);
+    }
+}
+
+void StudyCheck::check(const QByteArray& studyUID)
+{
+    TagFile file;
+    if (!succeeded(mCatalogue.studyContents(studyUID, mContents))) {
+        ++mFindings.unreadable;
+        return;
+    }
+    if (mContents.isWaiting)
+        fault(QStringLiteral("Study %1 waits to be built").arg(textOf(studyUID)));
+    if (!read(studyUID, file))
+        return;
+    ++mFindings.studies;
+    if (!mContents.isWaiting)
+        checkListing(studyUID, file);
+    checkPreviews(studyUID, file);
+    qint64 done = 0;
+    const auto& images = file.imagesByUID();
+    for (auto it = images.cbegin(); it != images.cend() && !mObserver.isCancelled(); ++it) {
+        checkImage(it.key(), *it.value());
+        mObserver.progress(++done, images.size());
+    }
+}
+
+bool StudyCheck::read(const QByteArray& studyUID, TagFile& file)
+{
+    if (file.readCacheFileForStudy(studyUID.constData(), false))
+        return true;
+    // One that waits to be built for the first time has none yet, which was told.
+    const QString path = TagFile::cacheFilePathForStudy(studyUID.constData());
+    if (!mContents.isWaiting || QFileInfo::exists(path)) {
+        ++mFindings.unreadable;
+        mReport(QStringLiteral("Study %1 %2").arg(textOf(studyUID), reasonOf(path, file)));
+    }
+    return false;
+}
+
+void StudyCheck::checkListing(const QByteArray& studyUID, const TagFile& file)
+{
+    const QString study = textOf(studyUID);
+    if (!mContents.tagFile.digest.isEmpty() &&
+        !isTagFile(TagFile::cacheFilePathForStudy(studyUID.constData()), mContents.tagFile))
+        fault(QStringLiteral("The tag file of study %1 is not the one that was written last").arg(study));
+    QSet<QByteArray> listed;
+    for (const Kxg::ListedImage& each : mContents.images) {
+        const QByteArray& key = each.sopInstanceUID.isEmpty() ? each.path : each.sopInstanceUID;
+        listed.insert(key);
+        const TagMap* image = file.findImage(key);
+        if (image == nullptr)
+            fault(QStringLiteral("Image %1 of study %2, %3, is not in the tag file")
+                      .arg(textOf(key), study, textOf(each.path)));
+        else if (filePathOf(*image) != each.path)
+            fault(QStringLiteral("Image %1 of study %2 is taken from %3, but %4 is registered")
+                      .arg(textOf(key), study, textOf(filePathOf(*image)), textOf(each.path)));
+        else if (image->uid(TagMap::SeriesLevel) != each.seriesInstanceUID)
+            fault(QStringLiteral("Image %1 of study %2 stands in series %3, but is registered in series %4")
+                      .arg(textOf(key), study, textOf(image->uid(TagMap::SeriesLevel)),
+                           textOf(each.seriesInstanceUID)));
+    }
+    for (auto it = file.imagesByUID().keyBegin(); it != file.imagesByUID().keyEnd(); ++it) {
+        if (!listed.contains(*it))
+            fault(QStringLiteral("Image %1 of study %2 is not registered").arg(textOf(*it), study));
+    }
+    checkVolumes(studyUID, file);
+}
+
+/// Of a study with corrections no file says how its volumes were divided.
+void StudyCheck::checkVolumes(const QByteArray& studyUID, const TagFile& file)
+{
+    if (mContents.isCorrected)
+        return;
+    QSet<QByteArray> found;
+    for (const TagMap* series : file.seriesByUID()) {
+        for (const Volume* volume : series->volumes()) {
+            const QByteArray name = volume->volumeFileName();
+            const auto& paths = mContents.volumes;
+            const auto path = std::find_if(paths.begin(), paths.end(), [&](const QByteArray& each) {
+                return !found.contains(each) && isVolumeOf(name, each);
+            });
+            if (path != paths.end())
+                found.insert(*path);
+            else
+                fault(QStringLiteral("Volume \"%1\" of study %2 is not registered")
+                          .arg(textOf(name), textOf(studyUID)));
+        }
+    }
+    for (const QByteArray& path : qAsConst(mContents.volumes)) {
+        if (!found.contains(path))
+            fault(QStringLiteral("Volume file %1 of study %2 is not in the tag file")
+                      .arg(textOf(path), textOf(studyUID)));
+    }
+}
+
+void StudyCheck::checkPreviews(const QByteArray& studyUID, const TagFile& file)
+{
+    if (const int missing = file.statistics().missingBlobs)
+        fault(QStringLiteral("The tag file of study %1 ends early: %2 previews are missing")
+                  .arg(textOf(studyUID))
+                  .arg(missing));
+}
+
+void StudyCheck::checkImage(const QByteArray& key, const TagMap& image)
+{
+    const QByteArray path = filePathOf(image);
+    DcmFileFormat dicom;
+    const OFCondition condition = readDicomFile(path.constData(), dicom);
+    if (condition.bad()) {
+        ++mFindings.unreadable;
+        mReport(
+            QStringLiteral("Could not load %1: %2").arg(textOf(path), QString::fromLatin1(condition.text())));
+        return;
+    }
+    ++mFindings.images;
+    mFindings.differences +=
+        verifyDataset(*dicom.getDataset(), image, [&](const QByteArray& attribute, const QByteArray& what) {
+            mReport(QStringLiteral("Image %1: %2 %3").arg(textOf(key), textOf(attribute), textOf(what)));
+        });
+}
+
+/// A tag file that the catalogue does not know of, or one that lies under another study's name.
+void StudyCheck::checkUnknown(const QString& path)
+{
+    TagFile file;
+    if (!file.readCacheFile(path, nullptr, false)) {
+        ++mFindings.unreadable;
+        mReport(QFileInfo(path).size() == 0
+                    ? QStringLiteral("The tag file %1 is empty").arg(path)
+                    : QStringLiteral("The tag file %1 cannot be read: %2").arg(path, file.failure()));
+        return;
+    }
+    const QString study = textOf(file.studyInstanceUID());
+    if (file.cacheFilePath() != path)
+        fault(QStringLiteral("The tag file %1 holds study %2, whose place is another one").arg(path, study));
+    else
+        fault(QStringLiteral("Study %1 has a tag file, %2, but is not registered").arg(study, path));
+}
+
+}  // namespace Kdd

@@ -1,0 +1,71 @@
+#pragma once
+
+#include "kddlib/tagfile/TagFile.h"
+#include "platform/base/Export.h"
+#include "platform/database/Catalogue.h"
+
+#include <QSet>
+
+#include <vector>
+
+namespace Kdd
+{
+
+/// What became of a study that was to be completed.
+struct CompletedStudy
+{
+    bool isDone = false;     ///< false: the reason is logged, and the study goes on waiting
+    bool isRemoved = false;  ///< the catalogue has no image of it, so it has no tag file any more
+    TagFile::Statistics statistics;
+};
+
+/// Brings the tag file of a claimed study into line with what the catalogue has of the study, and takes the study off
+/// the queue. There is one way to that for arrivals, for the queue, after removals and corrections alike:
+///
+/// - a study without images loses its tag file;
+/// - images that have just arrived are merged into a tag file that holds all the others and is the one that was written
+///   last; it is then built once more when nothing has arrived for a time (`ExResource::settleSeconds`), because the
+///   order of arrival shows in the order of the file;
+/// - from such a tag file images that were removed are taken out, likewise;
+/// - else the tag file is built from all files of the study.
+///
+/// A file that was removed by hand, restored from a backup or written by others is thus never taken for what the
+/// catalogue believes it to be.
+class KDD_EXPORT StudyCompletion
+{
+public:
+    /// The catalogue must outlive the object. Without `optimize` every attribute stays where it was found.
+    explicit StudyCompletion(Kxg::Catalogue& catalogue, bool optimize = true)
+        : mCatalogue(catalogue)
+        , mOptimize(optimize)
+    {
+    }
+
+    /// With images that were loaded already, each with its path in (0006,7100); of another study or not listed they are
+    /// ignored. What `arrivals` holds afterwards is not settled.
+    CompletedStudy complete(Kxg::StudyClaim& claim, TagFile& arrivals);
+
+    /// After a removal: takes out what is not listed any more, without opening a file where the tag file can be
+    /// trusted.
+    CompletedStudy reduce(Kxg::StudyClaim& claim);
+
+    /// From all files of the study.
+    CompletedStudy build(Kxg::StudyClaim& claim);
+
+private:
+    bool readContents(Kxg::StudyClaim& claim);
+    static CompletedStudy remove(Kxg::StudyClaim& claim);
+    CompletedStudy build(Kxg::StudyClaim& claim, const TagFile& loaded) const;
+    bool canMerge(const QByteArray& studyUID, const TagFile& arrivals, TagFile& present) const;
+    bool isTrusted(const QByteArray& studyUID) const;
+    bool holdsListed(const TagFile& arrivals, const TagFile& present) const;
+    std::vector<QByteArray> unlisted(const TagFile& present) const;
+    static CompletedStudy merge(Kxg::StudyClaim& claim, TagFile& arrivals, TagFile& present);
+
+    Kxg::Catalogue& mCatalogue;
+    bool mOptimize;
+    Kxg::StudyContents mContents;
+    QSet<QByteArray> mListed;  // the keys of its images
+};
+
+}  // namespace Kdd

@@ -1,0 +1,147 @@
+#include "kddlib/archive/StudyStacker.h"
+
+#include "kddlib/archive/ArchiveDatabase.h"
+#include "kddlib/archive/StudyCompletion.h"
+#include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
+#include "kddlib/tagmodel/TagMap.h"
+#include "kddlib/volumes/StackPlanner.h"
+#include "kddlib/volumes/StackWriter.h"
+#include "platform/base/LogFile.h"
+#include "platform/os/FileStatus.h"
+
+#include <QDir>
+#include <QFile>
+
+#include <utility>
+
+namespace Kdd
+{
+
+namespace
+{
+
+/// Below the folder of volumes as the tag files lie below theirs.
+QString folderOf(const QByteArray& studyUID, const QString& volumes)
+{
+    const QString tagFile = TagFile::cacheFilePathForStudy(studyUID.constData());
+    const QString place = tagFile.mid(QString::fromLocal8Bit(TagFile::metaFolder()).size());
+    return QDir(volumes).absoluteFilePath(place.left(place.lastIndexOf(QLatin1Char('.'))));
+}
+
+}  // namespace
+
+StudyStacker::StudyStacker(Kxg::Catalogue& catalogue, StackOptions options)
+    : mCatalogue(catalogue)
+    , mOptions(std::move(options))
+{
+}
+
+bool StudyStacker::stack(const QByteArray& studyUID)
+{
+    mStudyUID = studyUID;
+    mFolder = folderOf(studyUID, mOptions.folder);
+    mKnown.clear();
+    mMade = {};
+    mIsChanged = false;
+    mSeries.clear();
+    const std::unique_ptr<Kxg::StudyClaim> claim = claimStudy(mCatalogue, studyUID);
+    if (claim == nullptr)
+        return false;
+    const bool isDone = run();
+    return (!mIsChanged || StudyCompletion(mCatalogue).build(*claim).isDone) && isDone;
+}
+
+bool StudyStacker::run()
+{
+    removeUnfinished();
+    TagFile file;
+    if (!file.readCacheFileForStudy(mStudyUID.constData(), false)) {
+        LogFile::errorf("Study %s cannot be stacked: %s", mStudyUID.constData(),
+                        qUtf8Printable(file.failure()));
+        return false;
+    }
+    if (!succeeded(mCatalogue.volumeFiles(mStudyUID, mKnown)))
+        return false;
+    bool isDone = true;
+    for (auto it = file.seriesByUID().cbegin(); it != file.seriesByUID().cend(); ++it)
+        isDone = stackSeries(it.key(), *it.value()) && isDone;
+    if (mMade.volumes.empty())
+        return isDone;
+    mIsChanged = true;
+    Kxg::RegistrationOutcome outcome;
+    return succeeded(mCatalogue.registerFiles(mMade, outcome)) && isDone;
+}
+
+/// What a process that died while it wrote has left. The claim says that nobody writes there now.
+void StudyStacker::removeUnfinished() const
+{
+    QDir folder(mFolder);
+    const QStringList unfinished = folder.entryList({QStringLiteral("*.part")}, QDir::Files);
+    for (const QString& name : unfinished)
+        folder.remove(name);
+}
+
+bool StudyStacker::stackSeries(const QByteArray& seriesUID, const TagMap& series)
+{
+    mSeries.append(StackedSeries{seriesUID, {}, {}, false});
+    StackedSeries& told = mSeries.last();
+    if (!clearSeries(seriesUID, series, told.hadVolumes))
+        return false;
+    if (told.hadVolumes)
+        return true;
+    const StackPlan plan = planStacks(series);
+    for (const LeftOutFrame& leftOut : plan.leftOut)
+        ++told.reasons[leftOut.reason];
+    bool isDone = true;
+    int index = 0;
+    for (const Stack& stack : plan.stacks) {
+        if (!writeVolume(seriesUID, stack, index)) {
+            isDone = false;
+            continue;
+        }
+        ++index;
+        told.volumes.append(QString::asprintf("%d x %d x %d at %.4g mm", stack.dims.x, stack.dims.y,
+                                              stack.dims.z, stack.sliceSpacing));
+    }
+    return isDone;
+}
+
+/// A series that has volumes keeps them. Only those that were made here can be made again; then they go first, for
+/// there may be fewer this time.
+bool StudyStacker::clearSeries(const QByteArray& seriesUID, const TagMap& series, bool& isStacked)
+{
+    QVector<QByteArray> ours;
+    for (int i = 0; mKnown.contains(volumePath(seriesUID, i)); ++i)
+        ours.append(volumePath(seriesUID, i));
+    isStacked = ours.isEmpty() ? !series.volumes().isEmpty() : !mOptions.again;
+    if (ours.isEmpty() || isStacked)
+        return true;
+    if (!succeeded(mCatalogue.removeFiles(ours)))
+        return false;
+    mIsChanged = true;
+    for (const QByteArray& path : ours)
+        QFile::remove(QString::fromLocal8Bit(path));
+    return true;
+}
+
+bool StudyStacker::writeVolume(const QByteArray& seriesUID, const Stack& stack, int index)
+{
+    if (!QDir().mkpath(mFolder)) {
+        LogFile::errorf("Could not create folder %s", qUtf8Printable(mFolder));
+        return false;
+    }
+    const QByteArray path = volumePath(seriesUID, index);
+    FileStatus status;
+    if (!succeeded(writeStack(stack, filePathOf, path)) || !statusOf(path.constData(), status))
+        return false;
+    mMade.volumes.push_back({path, {status.size, status.modified}, mStudyUID, seriesUID});
+    return true;
+}
+
+QByteArray StudyStacker::volumePath(const QByteArray& seriesUID, int index) const
+{
+    return QDir(mFolder).filePath(QString::fromLocal8Bit(volumeFileName(seriesUID, index))).toLocal8Bit();
+}
+
+}  // namespace Kdd

@@ -1,0 +1,42 @@
+#include "tools/kdd/CommandProgress.h"
+
+#include "platform/base/LogFile.h"
+
+#include <csignal>
+
+namespace Kdd
+{
+
+namespace
+{
+
+volatile std::sig_atomic_t sInterrupted = 0;
+
+void noteInterrupt(int signal)
+{
+    sInterrupted = 1;
+    std::signal(signal, SIG_DFL);
+}
+
+}  // namespace
+
+void CommandProgress::catchInterrupts()
+{
+    std::signal(SIGINT, noteInterrupt);
+    std::signal(SIGTERM, noteInterrupt);
+}
+
+bool CommandProgress::wasInterrupted()
+{
+    return sInterrupted != 0;
+}
+
+bool toldOfInterrupt(const char* finished)
+{
+    if (!CommandProgress::wasInterrupted())
+        return false;
+    LogFile::errorf("Interrupted: %s; the same command again completes the rest", finished);
+    return true;
+}
+
+}  // namespace Kdd
