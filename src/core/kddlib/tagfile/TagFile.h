@@ -90,7 +90,7 @@ public:
 
     /// Places an image and takes it over. Null, and the map is deleted, when it belongs to another study than the one
     /// held, when the image is there already and `replace` is false, or when it has neither SOP Instance UID nor path.
-    /// `path` may be null; it gives the image's file name suffix.
+    /// `path` may be null; it gives the image's file name suffix. A map that this object holds already stays.
     TagMap* addTagMap(TagMap* map, const char* path, bool replace);
 
     /// The same for a dataset, which is only read.
@@ -179,7 +179,7 @@ public:
     bool writeCacheFile();
     bool writeCacheFile(const char* path);
 
-    /// Writes to a stream; false only when the study is too large for the format.
+    /// Writes to a stream. False, with nothing written, when the study holds what its reader would refuse or lose.
     bool writeCacheFile(QDataStream& out);
 
     /// Brings the images held here into the study's file, in place of images with the same UID, while the file is
@@ -303,6 +303,7 @@ private:
     };
 
     class BodyReader;
+    class BodyWriter;
     class QAJob;
     class QAVolumes;
 

@@ -50,6 +50,7 @@ bool TagFile::readCacheFileForStudy(const char* studyUID, bool keepOpen)
 bool TagFile::readCacheFile(const QString& path, const char* studyUID, bool keepOpen)
 {
     const Stopwatch stopwatch;
+    const QByteArray wanted(studyUID);  // may be that of the study that is let go of now
     if (mCacheFile.isOpen()) {
         LogFile::warnf("Tag file already opened");
         return fail(QStringLiteral("Tag file already opened"));
@@ -60,7 +61,7 @@ bool TagFile::readCacheFile(const QString& path, const char* studyUID, bool keep
     if (!openForReading(path, keepOpen))
         return false;
     QDataStream in(&mCacheFile);
-    const bool isRead = readCacheFile(in, studyUID);
+    const bool isRead = readCacheFile(in, studyUID != nullptr ? wanted.constData() : nullptr);
     if (!isRead || !keepOpen)
         mCacheFile.close();
     mStatistics.readMs = stopwatch.elapsed();
