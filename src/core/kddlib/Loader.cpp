@@ -150,7 +150,7 @@ bool Loader::refresh(const QByteArray& studyUID)
 TagFile& Loader::tagFileForStudy(const QByteArray& studyUID)
 {
     std::shared_ptr<TagFile>& file = mTagFiles[studyUID];
-    if (file != nullptr && !(file->isEmpty() && file->wasLockedOut()))
+    if (file != nullptr && !(file->wasLockedOut() && file->isEmpty()))
         return *file;
     // Always a new one: others may have the one that is there.
     file = std::make_shared<TagFile>();
