@@ -17,6 +17,8 @@
 #include "platform/base/Stopwatch.h"
 #include "platform/os/RandomAccessFile.h"
 
+#include <QFile>
+
 #include <dcmtk/dcmdata/dcfilefo.h>
 
 #include <algorithm>
@@ -96,6 +98,16 @@ QByteArray baseName(const QByteArray& path)
     return path.mid(qMax(path.lastIndexOf('/'), path.lastIndexOf('\\')) + 1);
 }
 
+bool readTagFile(TagFile& file, const QByteArray& studyUID)
+{
+    const Stopwatch stopwatch;
+    if (!file.readWhenFreeForStudy(studyUID.constData(), false))
+        return false;
+    const QString path = TagFile::cacheFilePathForStudy(studyUID.constData());
+    LogFile::printf("Tag file %s read in %d msec", qUtf8Printable(path), stopwatch.elapsed());
+    return true;
+}
+
 bool hasFilePath(const TagMap& image, const char* path)
 {
     const TagElement* held = image.tagsForLevel().value(kFilePath, nullptr);
@@ -119,19 +131,34 @@ void Loader::addTagFile(const QByteArray& studyUID, const std::shared_ptr<TagFil
 void Loader::clear()
 {
     mTagFiles.clear();
+    mLent.clear();
 }
 
-/// A study without tag file gets an empty one, so that the file is not looked for at every request.
+bool Loader::refresh(const QByteArray& studyUID)
+{
+    const auto file = std::make_shared<TagFile>();
+    const bool isRead = readTagFile(*file, studyUID);
+    if (!isRead &&
+        (file->wasLockedOut() || QFile::exists(TagFile::cacheFilePathForStudy(studyUID.constData()))))
+        return false;
+    addTagFile(studyUID, file);
+    return true;
+}
+
+/// A study without tag file gets an empty one, so that the file is not looked for at every request. An empty one that
+/// others held when it was to be read says nothing yet.
 TagFile& Loader::tagFileForStudy(const QByteArray& studyUID)
 {
     std::shared_ptr<TagFile>& file = mTagFiles[studyUID];
-    if (file != nullptr)
+    if (file != nullptr && !(file->wasLockedOut() && file->isEmpty()))
         return *file;
+    // Always a new one: others may have the one that is there.
     file = std::make_shared<TagFile>();
-    const Stopwatch stopwatch;
-    const QString path = TagFile::cacheFilePathForStudy(studyUID.constData());
-    if (file->readCacheFileForStudy(studyUID.constData(), false))
-        LogFile::printf("Tag file %s read in %d msec", qUtf8Printable(path), stopwatch.elapsed());
+    if (readTagFile(*file, studyUID))
+        return *file;
+    if (file->wasLockedOut())
+        LogFile::warnf("The tag file of study %s is held by others, its DICOM files answer",
+                       studyUID.constData());
     else
         LogFile::warnf("No tag file found for study %s", studyUID.constData());
     return *file;
@@ -166,7 +193,10 @@ std::shared_ptr<Item> Loader::loadDcmDataset(const char* path, int size)
 
 Volume* Loader::loadVolume(const char* path, const QByteArray& seriesUID, const QByteArray& studyUID)
 {
-    const TagMap* series = studyUID.isEmpty() ? nullptr : tagFileForStudy(studyUID).findSeries(seriesUID);
+    if (studyUID.isEmpty())
+        return nullptr;
+    const TagFile& file = tagFileForStudy(studyUID);
+    const TagMap* series = file.findSeries(seriesUID);
     if (series == nullptr)
         return nullptr;
     const QByteArray name = baseName(path);
@@ -181,8 +211,12 @@ Volume* Loader::loadVolume(const char* path, const QByteArray& seriesUID, const 
         LogFile::printf("No filename suffix. Cannot load volume from tag file.");
         return nullptr;
     }
-    if (Volume::fileNameSuffix(name.constData()) == volume->fileNameSuffix())
+    if (Volume::fileNameSuffix(name.constData()) == volume->fileNameSuffix()) {
+        // The tree as well as the tag file, which may be given another tree by whoever added it.
+        mLent.insert(file.study());
+        mLent.insert(mTagFiles.value(studyUID));
         return volume;
+    }
     LogFile::warnf("Filename suffix does not match. Cannot load volume from tag file.");
     return nullptr;
 }

@@ -198,7 +198,7 @@ void TagFileGenerator::completeArrivals(TagFile& arrivals)
     mLoadWatch = mVolumeWatch = mPreviewWatch = {};
     QList<QByteArray> chosen;
     TagFile whole;
-    if (whole.readCacheFileForStudy(arrivals.studyInstanceUID().constData(), false)) {
+    if (whole.readWhenFreeForStudy(arrivals.studyInstanceUID().constData(), false)) {
         for (const TagMap* image : arrivals.imagesByUID())
             whole.addTagMap(image->clone(), nullptr, true);
         whole.selectPreviewImages2D(chosen);
@@ -263,11 +263,10 @@ void TagFileGenerator::addPreviews(TagFile& tagFile, const QList<QByteArray>& ch
         if (image == nullptr)
             continue;
         const QByteArray path = filePathOf(*image);
-        DcmFileFormat reloaded;
-        DcmDataset* dataset = datasets.find(sopUID);
-        if (dataset == nullptr && loadDicomFile(path.constData(), reloaded).good())
-            dataset = reloaded.getDataset();
-        tagFile.addPreview(image, dataset, QString::fromLocal8Bit(path));
+        if (DcmDataset* dataset = datasets.find(sopUID))
+            tagFile.addPreview(image, dataset, QString::fromLocal8Bit(path));
+        else
+            tagFile.addPreview(image, path);
     }
 }
 

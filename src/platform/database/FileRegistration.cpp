@@ -128,13 +128,15 @@ void FileRegistration::put(const std::vector<Entry>& entries)
         const QVariant series =
             entry.kind == FileKind::Other ? QVariant(QVariant::LongLong) : obtainSeries(entry);
         values << bytesValue(entry.path) << entry.stamp.size << entry.stamp.modified
-               << static_cast<int>(entry.kind) << series << textValue(entry.sopUID);
+               << static_cast<int>(entry.kind) << series << textValue(entry.sopUID)
+               << static_cast<int>(entry.attributes && entry.attributes->isDamaged);
     }
     mConnection.change(
-        "INSERT INTO file (path, size, modified, kind, series_id, sop_uid) VALUES " +
-            repeated("(?, ?, ?, ?, ?, ?)", static_cast<int>(entries.size())) +
+        "INSERT INTO file (path, size, modified, kind, series_id, sop_uid, is_damaged) VALUES " +
+            repeated("(?, ?, ?, ?, ?, ?, ?)", static_cast<int>(entries.size())) +
             " ON CONFLICT (path) DO UPDATE SET size = excluded.size, modified = excluded.modified,"
-            " kind = excluded.kind, series_id = excluded.series_id, sop_uid = excluded.sop_uid",
+            " kind = excluded.kind, series_id = excluded.series_id, sop_uid = excluded.sop_uid,"
+            " is_damaged = excluded.is_damaged",
         values);
 }
 

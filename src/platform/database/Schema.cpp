@@ -48,6 +48,9 @@ const QStringList kSteps[] = {
             "CREATE TABLE config (section {text} NOT NULL, name {text} NOT NULL, value {bytes} NOT NULL,"
             " PRIMARY KEY (section, name))"),
     },
+    {
+        QStringLiteral("ALTER TABLE file ADD COLUMN is_damaged SMALLINT NOT NULL DEFAULT 0"),
+    },
 };
 
 QString firstRow(SqlConnection& connection, const QString& question)

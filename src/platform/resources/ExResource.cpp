@@ -33,6 +33,7 @@ constexpr Setting kMetaFolder = {"KDD_META_FOLDER", "folders/meta", ""};
 constexpr Setting kFileCacheFolder = {"KDD_FILE_CACHE", "folders/filecache", ""};
 constexpr Setting kTlsVerify = {"KDD_TLS_VERIFY", "tls/verify", "0"};
 constexpr Setting kTlsCaFile = {"KDD_TLS_CA_FILE", "tls/cafile", ""};
+constexpr Setting kReadPatience = {"KDD_READ_PATIENCE", "tagfiles/readpatience", "2000"};
 constexpr Setting kShareConnections = {"KDD_SHARE_CONNECTIONS", "web/shareconnections", "1"};
 
 using Values = QHash<QString, QByteArray>;
@@ -131,6 +132,19 @@ bool ExResource::verifiesTls()
 QByteArray ExResource::tlsCaFile()
 {
     return valueOf(kTlsCaFile);
+}
+
+int ExResource::readPatience()
+{
+    constexpr int kMost = 600000;
+    const QByteArray text = valueOf(kReadPatience);
+    bool isNumber = false;
+    const int patience = text.toInt(&isNumber);
+    if (isNumber && patience >= 0 && patience <= kMost)
+        return patience;
+    LogFile::warnf("%s is \"%s\", which is no number of 0 to %d", kReadPatience.variable, text.constData(),
+                   kMost);
+    return QByteArray(kReadPatience.standard).toInt();
 }
 
 bool ExResource::sharesConnections()

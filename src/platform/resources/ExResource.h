@@ -52,6 +52,10 @@ public:
     /// that the system trusts.
     static QByteArray tlsCaFile();
 
+    /// How long whoever serves others tries to read a tag file that others hold [ms], 0 to 600000; 400 are tried in any
+    /// case. A merge into the largest studies takes a second or two. KDD_READ_PATIENCE, tagfiles/readpatience, "2000".
+    static int readPatience();
+
     /// Whether all threads use one set of connections: not when the value is 0. KDD_SHARE_CONNECTIONS,
     /// web/shareconnections, "1".
     static bool sharesConnections();

@@ -264,15 +264,16 @@ Outcome Adder::report(const GlobalOptions& options, const FileScan& scan) const
 
 }  // namespace
 
-Outcome runAdd(const GlobalOptions& options, const QList<QByteArray>& paths)
+Outcome runAdd(const GlobalOptions& options, const ScanRequest& request)
 {
     const std::unique_ptr<Kxg::Catalogue> database = openDatabase();
     if (database == nullptr)
         return Outcome::Failed;
-    FileScan scan(*database, options);
+    FileScan scan(*database, options, request.tolerant ? Damage::Tolerated : Damage::Refused);
     Adder adder(*database);
-    const bool isDone = scan.run(paths, [&](DicomInput input) { return adder.take(std::move(input)); }) &&
-                        adder.writeAll() && (scan.unchanged() == 0 || adder.completeWaiting(paths));
+    const bool isDone =
+        scan.run(request.paths, [&](DicomInput input) { return adder.take(std::move(input)); }) &&
+        adder.writeAll() && (scan.unchanged() == 0 || adder.completeWaiting(request.paths));
     const Outcome outcome = adder.report(options, scan);
     return isDone ? outcome : Outcome::Failed;
 }

@@ -47,7 +47,7 @@ bool forget(Kxg::Catalogue& database, const QByteArray& studyUID, const NodeSele
 bool removeFromTagFile(const QByteArray& studyUID, const NodeSelection& selection, int& removed)
 {
     TagFile file;
-    if (!file.readCacheFileForStudy(studyUID.constData(), true)) {
+    if (!file.readWhenFreeForStudy(studyUID.constData(), true)) {
         LogFile::errorf("Study %s cannot be changed: %s", studyUID.constData(),
                         qUtf8Printable(file.failure()));
         return false;

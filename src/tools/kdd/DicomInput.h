@@ -31,6 +31,7 @@ struct DicomInput
     std::unique_ptr<TagMap> map;  ///< of an image, parentless
     QByteArray studyUID;
     QByteArray seriesUID;
+    QString leftOut;  ///< of an image that is damaged: what it lacks
     qint64 fileBytes = 0;
     qint64 headerBytes = 0;  ///< the file without its pixel data
 
@@ -40,9 +41,12 @@ struct DicomInput
     ~DicomInput();
 };
 
-/// Reads one file: of an image its attributes, of a volume file its header. Media directories (DICOMDIR) count as not DICOM: they describe files, not patients. May be called
-/// on several threads at once.
-DicomInput readDicomInput(const QByteArray& path);
+/// What to do with damaged DICOM files: refuse them, or take what is sound (`readDamagedDicomFile`).
+enum class Damage { Refused, Tolerated };
+
+/// Reads one file: of an image its attributes, of a volume file its header. Media directories (DICOMDIR) count as not
+/// DICOM: they describe files, not patients. May be called on several threads at once.
+DicomInput readDicomInput(const QByteArray& path, Damage damage);
 
 /// The files at and below the paths, absolute and sorted within each folder. Paths that do not exist and folders that
 /// cannot be entered are put into `faults` with the reason. Paths are bytes: a name that is no text in the present

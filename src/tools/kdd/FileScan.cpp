@@ -20,24 +20,25 @@ namespace
 /// Files read ahead of the one being handed on, so that reading uses every core.
 constexpr int kFilesPerTask = 16;
 
-std::vector<DicomInput> readSome(const QList<QByteArray>& paths)
+std::vector<DicomInput> readSome(const QList<QByteArray>& paths, Damage damage)
 {
     std::vector<DicomInput> inputs;
     inputs.reserve(static_cast<std::size_t>(paths.size()));
     for (const QByteArray& path : paths)
-        inputs.push_back(readDicomInput(path));
+        inputs.push_back(readDicomInput(path, damage));
     return inputs;
 }
 
 /// Reads the files on as many threads as there are cores and hands them on in their order.
-bool readAll(const QList<QByteArray>& files, const std::function<bool(DicomInput)>& take)
+bool readAll(const QList<QByteArray>& files, Damage damage, const std::function<bool(DicomInput)>& take)
 {
     const unsigned ahead = qMax(1U, std::thread::hardware_concurrency());
     std::deque<std::future<std::vector<DicomInput>>> running;
     int next = 0;
     while (next < files.size() || !running.empty()) {
         while (next < files.size() && running.size() <= ahead) {
-            running.push_back(std::async(std::launch::async, readSome, files.mid(next, kFilesPerTask)));
+            running.push_back(
+                std::async(std::launch::async, readSome, files.mid(next, kFilesPerTask), damage));
             next += kFilesPerTask;
         }
         for (DicomInput& input : running.front().get()) {
@@ -58,7 +59,7 @@ bool FileScan::run(const QList<QByteArray>& paths, const std::function<bool(Dico
         return false;
     Progress progress("Reading", !mOptions.quiet);
     qint64 done = 0;
-    return readAll(files, [&](DicomInput input) {
+    return readAll(files, mDamage, [&](DicomInput input) {
         progress.show(++done, files.size());
         return handOn(std::move(input), take);
     });
@@ -93,6 +94,10 @@ bool FileScan::handOn(DicomInput input, const std::function<bool(DicomInput)>& t
 {
     switch (input.kind) {
     case DicomInput::Kind::Image:
+        if (!input.leftOut.isEmpty())
+            LogFile::warnf("%s is damaged: left out %s", input.path.constData(),
+                           qUtf8Printable(input.leftOut));
+        break;
     case DicomInput::Kind::Volume:
         break;
     case DicomInput::Kind::Other:

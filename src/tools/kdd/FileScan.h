@@ -14,14 +14,16 @@ namespace Kdd
 class FileScan
 {
 public:
-    FileScan(Kxg::Catalogue& database, const GlobalOptions& options)
+    FileScan(Kxg::Catalogue& database, const GlobalOptions& options, Damage damage)
         : mDatabase(database)
         , mOptions(options)
+        , mDamage(damage)
     {
     }
 
     /// Reads the files at and below the paths, several at a time, and hands on what each one is in their order until
-    /// `take` returns false. Files that cannot be read are logged and counted as failed instead. False when the
+    /// `take` returns false. Files that cannot be read are logged and counted as failed instead; those of which
+    /// something is left out are warned about. False when the
     /// database failed or `take` ended it.
     bool run(const QList<QByteArray>& paths, const std::function<bool(DicomInput)>& take);
 
@@ -35,6 +37,7 @@ private:
 
     Kxg::Catalogue& mDatabase;
     const GlobalOptions& mOptions;
+    Damage mDamage;
     int mUnchanged = 0;
     int mSkipped = 0;
     int mFailed = 0;

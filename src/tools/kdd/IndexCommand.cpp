@@ -10,15 +10,16 @@
 namespace Kdd
 {
 
-Outcome runIndex(const GlobalOptions& options, const QList<QByteArray>& paths)
+Outcome runIndex(const GlobalOptions& options, const ScanRequest& request)
 {
     const std::unique_ptr<Kxg::Catalogue> database = openDatabase();
     if (database == nullptr)
         return Outcome::Failed;
-    FileScan scan(*database, options);
+    FileScan scan(*database, options, request.tolerant ? Damage::Tolerated : Damage::Refused);
     Registration registration(*database);
-    const bool isDone = scan.run(paths, [&](const DicomInput& input) { return registration.add(input); }) &&
-                        registration.flush();
+    const bool isDone = scan.run(request.paths, [&](const DicomInput& input) {
+        return registration.add(input);
+    }) && registration.flush();
     const int studies = registration.requests().size();
     if (options.json) {
         printJson({{QStringLiteral("studies"), studies},

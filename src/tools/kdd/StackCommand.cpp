@@ -37,10 +37,11 @@ struct StackedSeries
 class StudyStacker
 {
 public:
-    StudyStacker(Kxg::Catalogue& database, QString folder, bool again)
+    StudyStacker(Kxg::Catalogue& database, QString folder, const StackRequest& request)
         : mDatabase(database)
         , mFolder(std::move(folder))
-        , mAgain(again)
+        , mAgain(request.again)
+        , mReference(request.ignoresFrameOfReference ? FrameOfReference::Ignored : FrameOfReference::Shared)
     {
     }
 
@@ -65,6 +66,7 @@ private:
     Kxg::Catalogue& mDatabase;
     QString mFolder;
     bool mAgain;
+    FrameOfReference mReference;
     QByteArray mStudyUID;
     QVector<QByteArray> mKnown;  // volume files of the study
     Kxg::FileRecords mMade;
@@ -97,7 +99,7 @@ bool StudyStacker::stackSeries(const QByteArray& seriesUID, const TagMap& series
         return false;
     if (told.hadVolumes)
         return true;
-    const StackPlan plan = planStacks(series);
+    const StackPlan plan = planStacks(series, mReference);
     for (const LeftOutFrame& leftOut : plan.leftOut)
         ++told.reasons[leftOut.reason];
     bool isDone = true;
@@ -203,7 +205,7 @@ Outcome runStack(const GlobalOptions& options, const StackRequest& request)
     int volumes = 0;
     Progress progress("Stacking", !options.quiet);
     for (int i = 0; i < studyUIDs.size(); ++i) {
-        StudyStacker stacker(*database, volumeFolder(options, studyUIDs.at(i)), request.again);
+        StudyStacker stacker(*database, volumeFolder(options, studyUIDs.at(i)), request);
         isDone = stackStudy(*database, studyUIDs.at(i), stacker) && isDone;
         for (const StackedSeries& series : stacker.series()) {
             volumes += series.volumes.size();

@@ -70,9 +70,9 @@ bool readStudy(const QByteArray& text, TagFile& file)
 
 bool readStudyFile(const QString& path, TagFile& file)
 {
-    if (file.readCacheFile(path, nullptr, false))
+    if (file.readWhenFree(path, nullptr, false))
         return true;
-    if (!QFileInfo::exists(path))
+    if (!QFileInfo::exists(path) || file.wasLockedOut())
         LogFile::errorf("Could not open %s: %s", qUtf8Printable(path), qUtf8Printable(file.failure()));
     return false;
 }

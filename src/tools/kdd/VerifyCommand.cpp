@@ -1,4 +1,4 @@
-#include "kddlib/net/DicomFileReader.h"
+#include "kddlib/net/KxDcmFileLoader.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
@@ -30,7 +30,7 @@ void verifyImage(const QByteArray& key, const TagMap& image, Findings& findings)
 {
     const QByteArray path = filePathOf(image);
     DcmFileFormat file;
-    const OFCondition condition = readDicomFile(path.constData(), file);
+    const OFCondition condition = loadDicomFile(path.constData(), file);
     if (condition.bad()) {
         ++findings.unreadable;
         LogFile::errorf("Could not load %s: %s", path.constData(), condition.text());

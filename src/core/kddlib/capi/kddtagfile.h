@@ -17,7 +17,9 @@ extern "C" {
 ///
 /// Each call stands for itself; nothing but the settings of `ConfigureLogging` is kept between calls. Every function
 /// but that one may be called on any thread and by several at once, also for one and the same study and from several
-/// processes: who changes a tag file holds it alone meanwhile, and the others wait, up to about two seconds.
+/// processes: who changes a tag file holds it alone meanwhile, and the others wait. They try for 0.4 seconds and then
+/// fail, but for `DeleteTagFile`, which gives up after 50 ms, and `ReadAndSyncTagFileData`, which goes on for as long as
+/// the site's settings say, 2 seconds without them.
 ///
 /// Texts end with a zero byte, are UTF-8 and stay the caller's. A pointer that must not be null but is, or a negative
 /// count, makes a call do nothing but log and report failure. No C++ exception leaves a function; it is a failure,
@@ -58,7 +60,7 @@ KDD_EXPORT bool DeleteTagFile(const char* studyUID);
 KDD_EXPORT bool UpdateTagFile(const char* jobXml, const char* studyUID, int count, const char** images,
                               const char** cacheEntries);
 
-/// The same with wide texts.
+/// The same with wide texts. Whatever encoding the XML declares, its text is the text that is given.
 KDD_EXPORT bool UpdateTagFileW(const wchar_t* jobXml, const wchar_t* studyUID, int count,
                                const wchar_t** images, const wchar_t** cacheEntries);
 

@@ -1,5 +1,6 @@
 #include "kddlib/net/KxDcmFileLoader.h"
 
+#include "kddlib/net/DamagedFile.h"
 #include "kddlib/net/DcmInputCurlStream.h"
 #include "kddlib/net/DcmInputHttpStream.h"
 #include "kddlib/net/DicomParse.h"
@@ -92,7 +93,8 @@ try {
 OFCondition loadLocal(const char* name, DcmFileFormat& file, const ParseOptions& options)
 {
     DepthLimited<LocalFileStream> stream(name);
-    return parseDicom(stream, file, options);
+    const OFCondition condition = parseDicom(stream, file, options);
+    return condition.good() || options.reader ? condition : readAsRegistered(name, file, condition);
 }
 
 OFCondition load(const char* name, DcmFileFormat& file, Mode mode, ParseOptions options)

@@ -101,7 +101,7 @@ bool TagFile::readAndSync(const char* studyUIDGiven, const char* /*user*/)
         return false;
     }
     SeriesQuery query(studyUID);
-    const bool isRead = readCacheFileForStudy(studyUID, false);
+    const bool isRead = readWhenFreeForStudy(studyUID, false);
     QMap<QByteArray, std::shared_ptr<Kxg::SeriesInfo>> series;
     result = query.wait(series);
     if (!isRead) {
