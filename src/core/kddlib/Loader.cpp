@@ -47,18 +47,21 @@ std::shared_ptr<Item> loadWholeFile(const char* path)
 
 /// How many of the first bytes of an object there are; -1 when it cannot be had. No range is asked for, because not
 /// every server knows them; what is on its way beyond is broken off.
-qint64 readFirstOfObject(const char* url, QByteArray& bytes)
+qint64 readFirstOfObject(const char* url, QByteArray& bytes, std::string& reason)
 try {
     KxCurlDownloadStream stream = KxCurlClient::instance().read(url, false);
-    return stream.httpStatus().code / 100 == 2 ? stream.read(bytes.data(), bytes.size()).gcount() : -1;
-} catch (const std::exception&) {
+    const KxHttpStatus& status = stream.httpStatus();
+    reason = status.failed ? status.failure : "HTTP response code " + std::to_string(status.code);
+    return status.code / 100 == 2 ? stream.read(bytes.data(), bytes.size()).gcount() : -1;
+} catch (const std::exception& fault) {
+    reason = fault.what();
     return -1;
 }
 
-qint64 readFirst(const char* path, QByteArray& bytes)
+qint64 readFirst(const char* path, QByteArray& bytes, std::string& reason)
 {
     if (KxCurlClient::isUrl(path))
-        return readFirstOfObject(path, bytes);
+        return readFirstOfObject(path, bytes, reason);
     RandomAccessFile file;
     return file.open(path) == 0 ? qMax<qint64>(0, file.readAt(0, bytes.data(), bytes.size())) : -1;
 }
@@ -72,9 +75,10 @@ bool readBeginning(const char* path, int size, QByteArray& bytes)
         LogFile::errorf("%s: Could not allocate %lld bytes.", path, static_cast<long long>(size));
         return false;
     }
-    const qint64 count = readFirst(path, bytes);
+    std::string reason;
+    const qint64 count = readFirst(path, bytes, reason);
     if (count < 0)
-        LogFile::errorf("Could not open %s", path);
+        LogFile::errorf("Could not open %s%s%s", path, reason.empty() ? "" : ": ", reason.c_str());
     else if (count != size)
         LogFile::errorf("%s: Could only read %d of %d bytes", path, static_cast<int>(count), size);
     return count == size;

@@ -50,7 +50,9 @@ bool download(const char* url, QByteArray& bytes)
         LogFile::errorf("Reading %s failed: %s", url, fault.what());
         return false;
     }
-    if (!status.ok())
+    if (status.failed)
+        LogFile::errorf("Reading %s failed: %s", url, status.failure.c_str());
+    else if (!status.ok())
         LogFile::errorf("Reading %s failed: HTTP response code %d", url, status.code);
     return status.ok();
 }

@@ -34,7 +34,8 @@ constexpr Setting kFileCacheFolder = {"KDD_FILE_CACHE", "folders/filecache", ""}
 constexpr Setting kTlsVerify = {"KDD_TLS_VERIFY", "tls/verify", "0"};
 constexpr Setting kTlsCaFile = {"KDD_TLS_CA_FILE", "tls/cafile", ""};
 constexpr Setting kReadPatience = {"KDD_READ_PATIENCE", "tagfiles/readpatience", "2000"};
-constexpr Setting kShareConnections = {"KDD_SHARE_CONNECTIONS", "web/shareconnections", "1"};
+constexpr Setting kSessionHosts = {"KDD_SESSION_HOSTS", "web/sessionhosts", ""};
+constexpr Setting kShareConnections = {"KDD_SHARE_CONNECTIONS", "web/shareconnections", "0"};
 
 using Values = QHash<QString, QByteArray>;
 
@@ -147,9 +148,14 @@ int ExResource::readPatience()
     return QByteArray(kReadPatience.standard).toInt();
 }
 
+QByteArray ExResource::sessionHosts()
+{
+    return valueOf(kSessionHosts);
+}
+
 bool ExResource::sharesConnections()
 {
-    return valueOf(kShareConnections) != "0";
+    return valueOf(kShareConnections) == "1";
 }
 
 }  // namespace Kdd

@@ -99,6 +99,9 @@ void applyLogging(const GlobalOptions& global)
     LogFile::setLevel(global.quiet     ? LogFile::Level::Errors
                       : global.verbose ? LogFile::Level::Timing
                                        : LogFile::Level::Warnings);
+    // Each command tells itself why a transfer failed, and of what.
+    if (!global.verbose)
+        LogFile::dropTraces("CURL");
     // DCMTK's own lines do not name the file; what matters of them is told with it.
     OFLog::configure(global.verbose ? OFLogger::WARN_LOG_LEVEL : OFLogger::OFF_LOG_LEVEL);
 }

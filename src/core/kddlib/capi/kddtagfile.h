@@ -32,8 +32,8 @@ extern "C" {
 /// image database, "sqlite:FILE" or "postgresql://[USER[:PASSWORD]@]HOST[:PORT]/DATABASE"; null leaves it as it is.
 ///
 /// From then on everything is logged. Bit 0 of `flags`, debug: lines go to standard error and, when the environment
-/// variable KDD_LOG_FILE names one, to a file. Without it they go to the system's log (syslog). Bit 1, timings: also
-/// how long corrections took.
+/// variable KDD_LOG_FILE names one, to a file, and they tell how long tag files took to read and to write, and of each
+/// that is not there. Without it they go to the system's log (syslog). Bit 1, timings: also how long corrections took.
 KDD_EXPORT void ConfigureLogging(short flags, const char* databaseServer);
 
 /// Removes images from a study's tag file by their SOP Instance UIDs. UIDs that it does not hold are passed over;
