@@ -4,6 +4,7 @@
 #
 #     bench/transfers.sh BUILD-FOLDER [MIB] [ROUNDS]
 set -euo pipefail
+export LC_ALL=C  # times and rates with a decimal point
 build=$(cd "$1" && pwd)
 mib=${2:-1024}
 rounds=${3:-3}

@@ -50,6 +50,10 @@ void checkAddress(const std::string& address)
     require(url.empty() || url.compare(0, 7, "http://") == 0, "a storage path becomes a URL of HTTP");
     if (isCloudAddress(address))
         require(cloudUrl(address, CloudEndpoint::Api).compare(0, 4, "http") == 0, "so does a cloud address");
+    for (const std::string& made :
+         {url, isCloudAddress(address) ? cloudUrl(address, CloudEndpoint::Api) : ""})
+        require(made.find_first_of(std::string("# \n\0", 4)) == std::string::npos,
+                "no name breaks its address");
     require(withSessionId(address, "").size() == address.size(), "no session adds nothing");
 }
 

@@ -6,12 +6,14 @@
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/Volume.h"
+#include "platform/os/ExclusiveFile.h"
 #include "support/DatasetBuilder.h"
 #include "support/LogCapture.h"
 #include "support/TemporaryStore.h"
 
 #include <QDir>
 #include <QFile>
+#include <QFileInfo>
 
 #include <gtest/gtest.h>
 
@@ -24,7 +26,12 @@ namespace
 class LoaderTest : public testing::Test
 {
 protected:
-    LoaderTest() { QDir().mkpath(mStore.filePath("1.2")); }
+    LoaderTest()
+    {
+        QDir().mkpath(mStore.filePath("1.2"));
+        qputenv("KDD_READ_PATIENCE", "0");
+    }
+    ~LoaderTest() override { qunsetenv("KDD_READ_PATIENCE"); }
 
     QByteArray path(const char* name) const { return mStore.filePath("1.2").toLocal8Bit() + '/' + name; }
 
@@ -102,6 +109,50 @@ TEST_F(LoaderTest, AMissingTagFileIsLookedForOnce)
     EXPECT_EQ(log.count("No tag file found for study 1.2"), 2);
 }
 
+TEST_F(LoaderTest, ATagFileThatOthersHoldIsNotTakenForAbsent)
+{
+    add("1", "1_0.dcm");
+    ASSERT_TRUE(file->writeCacheFile());
+    QFile held;
+    ASSERT_TRUE(openLockedFile(held, file->cacheFilePath(), FileLock::Exclusive, IfAbsent::Fail, {1, 0}));
+    const LogCapture log;
+    EXPECT_EQ(nameIn(load("1_0.dcm")), "of^file");
+    EXPECT_EQ(log.count("held by others"), 1);
+    EXPECT_EQ(log.count("No tag file found"), 0);
+    held.close();
+    EXPECT_EQ(nameIn(load("1_0.dcm")), "of^cache");
+}
+
+TEST_F(LoaderTest, ATagFileThatIsJustBeingMadeIsNotTakenForAbsent)
+{
+    add("1", "1_0.dcm");
+    const QString path = TagFile::cacheFilePathForStudy("1.2");
+    QDir().mkpath(QFileInfo(path).path());
+    ASSERT_TRUE(QFile(path).open(QIODevice::WriteOnly));
+    EXPECT_EQ(nameIn(load("1_0.dcm")), "of^file");
+    ASSERT_TRUE(file->writeCacheFile());
+    EXPECT_EQ(nameIn(load("1_0.dcm")), "of^cache");
+}
+
+TEST_F(LoaderTest, TheLastVersionAnswersUntilThereIsANewOne)
+{
+    add("1", "1_0.dcm");
+    ASSERT_TRUE(file->writeCacheFile());
+    ASSERT_EQ(nameIn(load("1_0.dcm")), "of^cache");
+    file->findImage("1")->putAndInsertString(DCM_PatientName, "of^next");
+    ASSERT_TRUE(file->writeCacheFile());
+    QFile held;
+    ASSERT_TRUE(openLockedFile(held, file->cacheFilePath(), FileLock::Exclusive, IfAbsent::Fail, {1, 0}));
+    EXPECT_FALSE(loader.refresh("1.2"));
+    EXPECT_EQ(nameIn(load("1_0.dcm")), "of^cache");
+    held.close();
+    EXPECT_TRUE(loader.refresh("1.2"));
+    EXPECT_EQ(nameIn(load("1_0.dcm")), "of^next");
+    QFile::remove(file->cacheFilePath());
+    EXPECT_TRUE(loader.refresh("1.2"));
+    EXPECT_EQ(nameIn(load("1_0.dcm")), "of^file") << "the study is gone";
+}
+
 TEST_F(LoaderTest, OfPathsThatNameNoImageTheFileIsRead)
 {
     save(anImage("1").with(DCM_PatientName, "of^file"), "1_0.DCM");
@@ -164,6 +215,25 @@ TEST_F(LoaderTest, VolumesAreFoundByTheNamesOfTheirFiles)
         EXPECT_EQ(loader.loadVolume(name, "9", "1.2"), nullptr);
         EXPECT_EQ(loader.loadVolume(name, "1.2.3", ""), nullptr);
     }
+}
+
+TEST_F(LoaderTest, AVolumeOutlivesItsTagFileUntilTheLoaderIsCleared)
+{
+    add("1", "1_0.dcm");
+    TagMap* series = file->findSeries("1.2.3");
+    series->addBareVolume(new Volume(0));
+    series->volumes().last()->setFileNameSuffix("volume");
+    loader.addTagFile("1.2", file);
+    const Volume* volume = loader.loadVolume("1-volume.vol", "1.2.3", "1.2");
+    ASSERT_NE(volume, nullptr);
+    const std::weak_ptr<TagMap> study = file->study();
+    file->clear();
+    file.reset();
+    loader.addTagFile("1.2", std::make_shared<TagFile>());
+    ASSERT_FALSE(study.expired());
+    EXPECT_EQ(volume->fileNameSuffix(), "volume");
+    loader.clear();
+    EXPECT_TRUE(study.expired());
 }
 
 }  // namespace

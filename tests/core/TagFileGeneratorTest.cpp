@@ -244,6 +244,17 @@ TEST_F(GeneratorTest, ADatabaseThatCannotAnswerFailsTheBuild)
     EXPECT_EQ(log.count("Database query GetAllFilesOfStudy() failed."), 1);
 }
 
+TEST_F(GeneratorTest, AMissingPreviewIsExplainedByWhatTheLoadingSays)
+{
+    TagFile arrivals;
+    arrivals.addTagMap(aPicture("1", "1").map(), nullptr, true)
+        ->putAndInsertValue(kFilePath, VrCode::LO, path("gone"));
+    const LogCapture log;
+    TagFileGenerator().completeArrivals(arrivals);
+    EXPECT_EQ(log.count("(No such file or directory)"), 1);
+    EXPECT_EQ(log.count("no dataset"), 0);
+}
+
 TEST_F(GeneratorTest, ArrivalsGetThePreviewsThatTheWholeStudyWants)
 {
     const QByteArray numbers[] = {"10", "11", "12", "13", "14", "15", "16", "17", "18", "19", "20"};

@@ -22,6 +22,8 @@ namespace
     LogFile::setLevel(LogFile::Level::Warnings);
     LogFile::printf("too little");
     LogFile::warnf("{} %s", "Doe\r\nerror\x1b[2J \xc3\xbc");
+    LogFile::warnf("ours\n%s|\n", "Doe\n|");
+    LogFile::write(LogFile::Severity::Warning, "ours\n" + LogFile::escaped("Doe\n"));
     std::cerr << "file: " << (file.open(QIODevice::ReadOnly) ? file.readAll().constData() : "none");
     folder.remove();
     std::exit(0);
@@ -30,7 +32,8 @@ namespace
 TEST(LogFile, LinesOfTheLevelGoToStandardErrorAndToTheFileAndNoValueCanForgeOne)
 {
     testing::GTEST_FLAG(death_test_style) = "threadsafe";
-    const std::string line = "[-0-9]+ [:.0-9]+ warning \\{\\} Doe\\\\x0d\\\\x0aerror\\\\x1b\\[2J \xc3\xbc\n";
+    const std::string line = "[-0-9]+ [:.0-9]+ warning \\{\\} Doe\\\\x0d\\\\x0aerror\\\\x1b\\[2J \xc3\xbc\n"
+                             "[^\n]*ours\nDoe\\\\x0a\\|\\|\n\n[^\n]*ours\nDoe\\\\x0a\n";
     EXPECT_EXIT(logToFile(), testing::ExitedWithCode(0), testing::MatchesRegex(line + "file: " + line));
 }
 

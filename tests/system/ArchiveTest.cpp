@@ -143,6 +143,45 @@ TEST_F(Archive, SeriesBecomeVolumesAndStudiesPictures)
     EXPECT_EQ(kdd("previews --all", QStringList{QStringLiteral("/proc/kdd")}).exitCode, 1);
 }
 
+TEST_F(Archive, ADamagedFileThatWasTakenIsReadByWhateverComesLater)
+{
+    save("1", anImage("1"));
+    save("2", anImage("2").with(DCM_PatientName, "Doe^J").withLong(DCM_TextValue, 3000));
+    put("2", bytes("2").chopped(100));
+    const QStringList tolerant = {QStringLiteral("--tolerant"), images()};
+    EXPECT_EQ(addImages().number("failed"), 1);
+    const Answer taken = kdd("add --json", tolerant);
+    EXPECT_EQ(taken.number("failed"), 0);
+    EXPECT_EQ(taken.number("images"), 2);
+    EXPECT_TRUE(taken.err.contains("left out (0040,a160)")) << taken.err.toStdString();
+    EXPECT_EQ(kdd("build --all --again --json").number("images"), 2);
+    EXPECT_EQ(kdd("verify --all --json").out,
+              "{\"differences\":0,\"images\":2,\"studies\":1,\"unreadable\":0}\n");
+    EXPECT_TRUE(kdd("metadata 1.2 --image 2").out.contains("Doe^J"));
+    put("2", bytes("2").chopped(100));
+    EXPECT_EQ(kdd("verify --all --json").number("unreadable"), 1) << "not the file that was taken";
+}
+
+TEST_F(Archive, SlicesOfDifferentFramesOfReferenceAreStackedOnRequest)
+{
+    for (const char* number : {"1", "2", "3", "4"}) {
+        DatasetBuilder slice = anImage(number).with(DCM_InstanceNumber, number);
+        slice.with(DCM_ImagePositionPatient, (std::string("0\\0\\") + number).c_str());
+        slice.with(DCM_ImageOrientationPatient, "1\\0\\0\\0\\1\\0").with(DCM_PixelSpacing, "1\\1");
+        slice.with(DCM_Columns, "4").with(DCM_Rows, "3").with(DCM_PhotometricInterpretation, "MONOCHROME2");
+        slice.with(DCM_SamplesPerPixel, "1").with(DCM_BitsAllocated, "16").with(DCM_BitsStored, "16");
+        slice.with(DCM_HighBit, "15").with(DCM_PixelRepresentation, "0");
+        slice.with(DCM_FrameOfReferenceUID, number);
+        const Uint16 pixels[12] = {0, 1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11};
+        slice.dataset().putAndInsertUint16Array(DCM_PixelData, pixels, 12);
+        save(number, slice);
+    }
+    EXPECT_EQ(addImages().number("failed"), 0);
+    EXPECT_TRUE(kdd("stack").out.contains("    4 left out: Its Frame of Reference")) << "told once";
+    EXPECT_EQ(kdd("stack --json --ignore-frame-of-reference").number("volumes"), 1);
+    EXPECT_EQ(kdd("verify --all").exitCode, 0);
+}
+
 TEST_F(Archive, SyncingKeepsWhatTheDatabaseKnows)
 {
     addTwoStudies();

@@ -60,6 +60,24 @@ TEST_F(Get, LeavesNothingOfAnErrorPage)
     EXPECT_EQ(get(server.url("")).exitCode, 2);
 }
 
+TEST_F(Get, FollowsRedirectsAndTellsOfAFaultOnce)
+{
+    const NginxServer server(NginxServer::Scheme::Http, "location = /old { return 307 /a.dcm; }"
+                                                        "location = /round { return 302 /round; }");
+    server.addFile("a.dcm", "content");
+    EXPECT_EQ(get(server.url("old")).exitCode, 0);
+    EXPECT_EQ(fetched("old"), "content");
+    const std::pair<std::string, const char*> faults[] = {{server.url("round"), "more than 5 times"},
+                                                          {"http://127.0.0.1:1/x", "Failed to connect"}};
+    for (const auto& [url, reason] : faults) {
+        const Answer answer = get(url);
+        EXPECT_EQ(answer.exitCode, 1);
+        EXPECT_EQ(answer.err.count(reason), 1) << answer.err.toStdString();
+        EXPECT_EQ(answer.err.count('\n'), 1);
+    }
+    EXPECT_EQ(names(), QStringList{QStringLiteral("old")});
+}
+
 /// Cuts every body short until it is told to stop; then gives all, of one version or the other.
 class Resumed : public Get
 {

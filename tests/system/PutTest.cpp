@@ -55,7 +55,8 @@ TEST_F(Put, NamesWhatKeptItFromUploading)
     } const kCases[] = {{file("absent"), "gs://b/o", 1, "/absent: No such file"},
                         {images(), "gs://b/o", 1, "/images: "},
                         {file("file"), "https://a/b", 2, "https://a/b names no object of the cloud storage"},
-                        {file("file"), "gs://b", 2, "gs://b names no object"}};
+                        {file("file"), "gs://b", 2, "gs://b names no object"},
+                        {file("file"), "gs://b/o?x", 2, "gs://b/o?x has a \"?\""}};
     for (const auto& one : kCases) {
         const Answer answer = upload(one.path, one.url);
         EXPECT_EQ(answer.exitCode, one.exitCode);
@@ -70,8 +71,17 @@ TEST_F(Put, NamesWhatKeptItFromUploading)
         EXPECT_EQ(answer.exitCode, 1);
         EXPECT_TRUE(answer.err.contains("/file was not uploaded to gs://b/o: HTTP code 403"))
             << answer.err.toStdString();
+        EXPECT_EQ(answer.err.count("HTTP code 403"), 1) << answer.err.toStdString();
     }
     EXPECT_TRUE(store.object("b/o").isNull());
+}
+
+TEST_F(Put, WritesTheObjectOfThatNameOnly)
+{
+    put("file", "bytes");
+    EXPECT_EQ(upload(file("file"), "gs://b/scan#1 a.dcm").exitCode, 0);
+    EXPECT_EQ(store.object("b/scan%231%20a.dcm"), "bytes");
+    EXPECT_TRUE(store.object("b/scan").isNull());
 }
 
 }  // namespace

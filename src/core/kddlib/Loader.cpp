@@ -17,6 +17,8 @@
 #include "platform/base/Stopwatch.h"
 #include "platform/os/RandomAccessFile.h"
 
+#include <QFile>
+
 #include <dcmtk/dcmdata/dcfilefo.h>
 
 #include <algorithm>
@@ -45,18 +47,21 @@ std::shared_ptr<Item> loadWholeFile(const char* path)
 
 /// How many of the first bytes of an object there are; -1 when it cannot be had. No range is asked for, because not
 /// every server knows them; what is on its way beyond is broken off.
-qint64 readFirstOfObject(const char* url, QByteArray& bytes)
+qint64 readFirstOfObject(const char* url, QByteArray& bytes, std::string& reason)
 try {
     KxCurlDownloadStream stream = KxCurlClient::instance().read(url, false);
-    return stream.httpStatus().code / 100 == 2 ? stream.read(bytes.data(), bytes.size()).gcount() : -1;
-} catch (const std::exception&) {
+    const KxHttpStatus& status = stream.httpStatus();
+    reason = status.failed ? status.failure : "HTTP response code " + std::to_string(status.code);
+    return status.code / 100 == 2 ? stream.read(bytes.data(), bytes.size()).gcount() : -1;
+} catch (const std::exception& fault) {
+    reason = fault.what();
     return -1;
 }
 
-qint64 readFirst(const char* path, QByteArray& bytes)
+qint64 readFirst(const char* path, QByteArray& bytes, std::string& reason)
 {
     if (KxCurlClient::isUrl(path))
-        return readFirstOfObject(path, bytes);
+        return readFirstOfObject(path, bytes, reason);
     RandomAccessFile file;
     return file.open(path) == 0 ? qMax<qint64>(0, file.readAt(0, bytes.data(), bytes.size())) : -1;
 }
@@ -70,9 +75,10 @@ bool readBeginning(const char* path, int size, QByteArray& bytes)
         LogFile::errorf("%s: Could not allocate %lld bytes.", path, static_cast<long long>(size));
         return false;
     }
-    const qint64 count = readFirst(path, bytes);
+    std::string reason;
+    const qint64 count = readFirst(path, bytes, reason);
     if (count < 0)
-        LogFile::errorf("Could not open %s", path);
+        LogFile::errorf("Could not open %s%s%s", path, reason.empty() ? "" : ": ", reason.c_str());
     else if (count != size)
         LogFile::errorf("%s: Could only read %d of %d bytes", path, static_cast<int>(count), size);
     return count == size;
@@ -94,6 +100,16 @@ std::shared_ptr<Item> loadBeginning(const char* path, int size)
 QByteArray baseName(const QByteArray& path)
 {
     return path.mid(qMax(path.lastIndexOf('/'), path.lastIndexOf('\\')) + 1);
+}
+
+bool readTagFile(TagFile& file, const QByteArray& studyUID)
+{
+    const Stopwatch stopwatch;
+    if (!file.readWhenFreeForStudy(studyUID.constData(), false))
+        return false;
+    const QString path = TagFile::cacheFilePathForStudy(studyUID.constData());
+    LogFile::printf("Tag file %s read in %d msec", qUtf8Printable(path), stopwatch.elapsed());
+    return true;
 }
 
 bool hasFilePath(const TagMap& image, const char* path)
@@ -119,19 +135,34 @@ void Loader::addTagFile(const QByteArray& studyUID, const std::shared_ptr<TagFil
 void Loader::clear()
 {
     mTagFiles.clear();
+    mLent.clear();
 }
 
-/// A study without tag file gets an empty one, so that the file is not looked for at every request.
+bool Loader::refresh(const QByteArray& studyUID)
+{
+    const auto file = std::make_shared<TagFile>();
+    const bool isRead = readTagFile(*file, studyUID);
+    if (!isRead &&
+        (file->wasLockedOut() || QFile::exists(TagFile::cacheFilePathForStudy(studyUID.constData()))))
+        return false;
+    addTagFile(studyUID, file);
+    return true;
+}
+
+/// A study without tag file gets an empty one, so that the file is not looked for at every request. An empty one that
+/// others held when it was to be read says nothing yet.
 TagFile& Loader::tagFileForStudy(const QByteArray& studyUID)
 {
     std::shared_ptr<TagFile>& file = mTagFiles[studyUID];
-    if (file != nullptr)
+    if (file != nullptr && !(file->wasLockedOut() && file->isEmpty()))
         return *file;
+    // Always a new one: others may have the one that is there.
     file = std::make_shared<TagFile>();
-    const Stopwatch stopwatch;
-    const QString path = TagFile::cacheFilePathForStudy(studyUID.constData());
-    if (file->readCacheFileForStudy(studyUID.constData(), false))
-        LogFile::printf("Tag file %s read in %d msec", qUtf8Printable(path), stopwatch.elapsed());
+    if (readTagFile(*file, studyUID))
+        return *file;
+    if (file->wasLockedOut())
+        LogFile::warnf("The tag file of study %s is held by others, its DICOM files answer",
+                       studyUID.constData());
     else
         LogFile::warnf("No tag file found for study %s", studyUID.constData());
     return *file;
@@ -166,7 +197,10 @@ std::shared_ptr<Item> Loader::loadDcmDataset(const char* path, int size)
 
 Volume* Loader::loadVolume(const char* path, const QByteArray& seriesUID, const QByteArray& studyUID)
 {
-    const TagMap* series = studyUID.isEmpty() ? nullptr : tagFileForStudy(studyUID).findSeries(seriesUID);
+    if (studyUID.isEmpty())
+        return nullptr;
+    const TagFile& file = tagFileForStudy(studyUID);
+    const TagMap* series = file.findSeries(seriesUID);
     if (series == nullptr)
         return nullptr;
     const QByteArray name = baseName(path);
@@ -181,8 +215,12 @@ Volume* Loader::loadVolume(const char* path, const QByteArray& seriesUID, const 
         LogFile::printf("No filename suffix. Cannot load volume from tag file.");
         return nullptr;
     }
-    if (Volume::fileNameSuffix(name.constData()) == volume->fileNameSuffix())
+    if (Volume::fileNameSuffix(name.constData()) == volume->fileNameSuffix()) {
+        // The tree as well as the tag file, which may be given another tree by whoever added it.
+        mLent.insert(file.study());
+        mLent.insert(mTagFiles.value(studyUID));
         return volume;
+    }
     LogFile::warnf("Filename suffix does not match. Cannot load volume from tag file.");
     return nullptr;
 }

@@ -50,7 +50,9 @@ bool download(const char* url, QByteArray& bytes)
         LogFile::errorf("Reading %s failed: %s", url, fault.what());
         return false;
     }
-    if (!status.ok())
+    if (status.failed)
+        LogFile::errorf("Reading %s failed: %s", url, status.failure.c_str());
+    else if (!status.ok())
         LogFile::errorf("Reading %s failed: HTTP response code %d", url, status.code);
     return status.ok();
 }
@@ -269,11 +271,10 @@ void TagFileGenerator::addPreviews(TagFile& tagFile, const QList<QByteArray>& ch
         if (image == nullptr)
             continue;
         const QByteArray path = filePathOf(*image);
-        DcmFileFormat reloaded;
-        DcmDataset* dataset = datasets.find(sopUID);
-        if (dataset == nullptr && loadDicomFile(path.constData(), reloaded).good())
-            dataset = reloaded.getDataset();
-        tagFile.addPreview(image, dataset, QString::fromLocal8Bit(path));
+        if (DcmDataset* dataset = datasets.find(sopUID))
+            tagFile.addPreview(image, dataset, QString::fromLocal8Bit(path));
+        else
+            tagFile.addPreview(image, path);
     }
 }
 

@@ -4,6 +4,7 @@
 #include <spdlog/sinks/stdout_color_sinks.h>
 #include <spdlog/spdlog.h>
 
+#include <algorithm>
 #include <cstdarg>
 #include <cstdio>
 #include <cstdlib>
@@ -25,6 +26,8 @@ struct Settings
     LogFile::Level level = LogFile::Level::Information;
     LogFile::Severity least = LogFile::Severity::Trace;
     LogFile::Callback callback;
+    bool isDebugWanted = false;
+    std::string droppedCategory;
 };
 
 Settings& settings()
@@ -116,34 +119,63 @@ std::string formatted(const char* format, va_list arguments)
     return text;
 }
 
-std::string withoutControlCharacters(const std::string& text)
+/// Escapes all control characters but the line feeds for which `isOwn` says yes to their place.
+template <typename IsOwn>
+std::string escapedBut(const std::string& text, const IsOwn& isOwn)
 {
     static const char* const kDigits = "0123456789abcdef";
     std::string clean;
     clean.reserve(text.size());
-    for (const char c : text) {
-        const auto byte = static_cast<unsigned char>(c);
-        if (byte >= 0x20 && byte != 0x7f)
-            clean += c;
+    for (std::size_t i = 0; i < text.size(); ++i) {
+        const auto byte = static_cast<unsigned char>(text[i]);
+        if ((byte >= 0x20 && byte != 0x7f) || (byte == '\n' && isOwn(i)))
+            clean += text[i];
         else
             clean.append("\\x").append(1, kDigits[byte >> 4]).append(1, kDigits[byte & 15]);
     }
     return clean;
 }
 
-void write(LogFile::Severity severity, const char* category, const char* format, va_list arguments)
+/// The line with its values escaped. A line feed is the format's own where another character comes out when the format
+/// has that one instead: no value can make itself look like that.
+std::string lineOf(const char* format, va_list arguments)
+{
+    const std::string original(format);
+    if (original.find('\n') == std::string::npos)
+        return LogFile::escaped(formatted(format, arguments));
+    std::string marked = original;
+    std::replace(marked.begin(), marked.end(), '\n', '|');
+    va_list again;
+    va_copy(again, arguments);
+    const std::string text = formatted(format, arguments);
+    const std::string other = formatted(marked.c_str(), again);
+    va_end(again);
+    return escapedBut(text, [&](std::size_t i) { return other.size() == text.size() && other[i] == '|'; });
+}
+
+bool isWanted(LogFile::Severity severity, const char* category)
 {
     const Settings& current = settings();
-    const bool toCallback = current.callback && severity >= current.least;
-    if (!toCallback && neededLevel(severity) > current.level)
-        return;
-    const std::string line = withoutControlCharacters(formatted(format, arguments));
-    if (toCallback)
+    if (*category != '\0' && current.droppedCategory == category)
+        return false;
+    return (current.callback && severity >= current.least) || neededLevel(severity) <= current.level;
+}
+
+void writeLine(LogFile::Severity severity, const char* category, const std::string& line)
+{
+    const Settings& current = settings();
+    if (current.callback && severity >= current.least)
         current.callback(severity, category, line);
     else if (*category != '\0')
         logger().log(spdlogLevel(severity), "[{}] {}", category, line);
     else
         logger().log(spdlogLevel(severity), line);
+}
+
+void writeFormatted(LogFile::Severity severity, const char* category, const char* format, va_list arguments)
+{
+    if (isWanted(severity, category))
+        writeLine(severity, category, lineOf(format, arguments));
 }
 
 }  // namespace
@@ -152,7 +184,7 @@ void LogFile::errorf(const char* format, ...)
 {
     va_list arguments;
     va_start(arguments, format);
-    write(Severity::Error, "", format, arguments);
+    writeFormatted(Severity::Error, "", format, arguments);
     va_end(arguments);
 }
 
@@ -160,7 +192,7 @@ void LogFile::warnf(const char* format, ...)
 {
     va_list arguments;
     va_start(arguments, format);
-    write(Severity::Warning, "", format, arguments);
+    writeFormatted(Severity::Warning, "", format, arguments);
     va_end(arguments);
 }
 
@@ -168,7 +200,7 @@ void LogFile::printf(const char* format, ...)
 {
     va_list arguments;
     va_start(arguments, format);
-    write(Severity::Information, "", format, arguments);
+    writeFormatted(Severity::Information, "", format, arguments);
     va_end(arguments);
 }
 
@@ -176,13 +208,25 @@ void LogFile::tracef(int level, const char* category, const char* format, ...)
 {
     va_list arguments;
     va_start(arguments, format);
-    write(severityOfTrace(level), category, format, arguments);
+    writeFormatted(severityOfTrace(level), category, format, arguments);
     va_end(arguments);
+}
+
+void LogFile::write(Severity severity, const std::string& text)
+{
+    if (isWanted(severity, ""))
+        writeLine(severity, "", escapedBut(text, [](std::size_t /*place*/) { return true; }));
+}
+
+std::string LogFile::escaped(const std::string& text)
+{
+    return escapedBut(text, [](std::size_t /*place*/) { return false; });
 }
 
 void LogFile::setLevel(Level level)
 {
     settings().level = level;
+    settings().isDebugWanted = level >= Level::Timing;
 }
 
 LogFile::Level LogFile::level()
@@ -192,7 +236,17 @@ LogFile::Level LogFile::level()
 
 bool LogFile::debugLogging()
 {
-    return settings().level >= Level::Timing;
+    return settings().isDebugWanted;
+}
+
+void LogFile::setDebugLogging(bool isWanted)
+{
+    settings().isDebugWanted = isWanted;
+}
+
+void LogFile::dropTraces(const char* category)
+{
+    settings().droppedCategory = category;
 }
 
 void LogFile::setCallback(Callback callback, Severity least)

@@ -39,6 +39,8 @@ struct DicomFileRecord
     QByteArray studyInstanceUID;  ///< any of the three may be empty
     QByteArray seriesInstanceUID;
     QByteArray sopInstanceUID;
+    bool isDamaged =
+        false;  ///< a strict reader refuses it; it was taken nevertheless, for what is sound of it
 
     // of the study
     QByteArray patientName;

@@ -133,13 +133,15 @@ void FileRegistration::write(const std::vector<Entry>& entries)
     for (const Entry& entry : entries)
         values << bytesValue(entry.path) << entry.stamp.size << entry.stamp.modified
                << static_cast<int>(entry.kind) << entry.seriesId << textValue(entry.sopUID) << mNumber++
-               << (entry.isShown ? 1 : 0);
+               << (entry.isShown ? 1 : 0) << (entry.attributes && entry.attributes->isDamaged ? 1 : 0);
     mConnection.change(
-        "INSERT INTO file (path, size, modified, kind, series_id, sop_uid, registered, is_shown) VALUES " +
-            repeated("(?, ?, ?, ?, ?, ?, ?, ?)", static_cast<int>(entries.size())) +
+        "INSERT INTO file (path, size, modified, kind, series_id, sop_uid, registered, is_shown,"
+        " is_damaged) VALUES " +
+            repeated("(?, ?, ?, ?, ?, ?, ?, ?, ?)", static_cast<int>(entries.size())) +
             " ON CONFLICT (path) DO UPDATE SET size = excluded.size, modified = excluded.modified,"
             " kind = excluded.kind, series_id = excluded.series_id, sop_uid = excluded.sop_uid,"
-            " registered = excluded.registered, is_shown = excluded.is_shown",
+            " registered = excluded.registered, is_shown = excluded.is_shown,"
+            " is_damaged = excluded.is_damaged",
         values);
 }
 

@@ -5,6 +5,7 @@
 #include "platform/database/SqlConnection.h"
 #include "platform/database/StudyContent.h"
 #include "platform/database/StudyListing.h"
+#include "platform/os/FileStatus.h"
 
 #include <QHash>
 
@@ -132,6 +133,21 @@ Kdd::Result GetSeries(const QByteArray& studyUID, QMap<QByteArray, std::shared_p
         }
         series.swap(found);
     });
+}
+
+bool IsDamagedFile(const char* path)
+{
+    Kdd::FileStatus status;
+    if (DatabaseServer().isEmpty() || !Kdd::statusOf(path, status))
+        return false;
+    bool isDamaged = false;
+    const Kdd::Result result = askDatabase([&](SqlConnection& connection) {
+        SqlRows rows = connection.ask(
+            "SELECT 1 FROM file WHERE path = ? AND size = ? AND modified = ? AND is_damaged = 1",
+            {bytesValue(path), status.size, status.modified});
+        isDamaged = rows.next();
+    });
+    return result.good() && isDamaged;
 }
 
 QByteArray GetGlobalConfig(const QByteArray& section, const QByteArray& key, const QByteArray& fallback)

@@ -39,6 +39,10 @@ KDD_EXPORT Kdd::Result GetStudy(const QByteArray& studyUID, std::shared_ptr<Dico
 KDD_EXPORT Kdd::Result GetSeries(const QByteArray& studyUID,
                                  QMap<QByteArray, std::shared_ptr<SeriesInfo>>& series);
 
+/// Whether a file was registered as damaged (`DicomFileRecord::isDamaged`) and has not changed since. False when it
+/// does not exist or the database cannot be asked.
+KDD_EXPORT bool IsDamagedFile(const char* path);
+
 /// A configuration value, or `fallback` when it is not set or cannot be asked for.
 KDD_EXPORT QByteArray GetGlobalConfig(const QByteArray& section, const QByteArray& key,
                                       const QByteArray& fallback);

@@ -49,6 +49,8 @@ const QStringList kSteps[] = {
             " PRIMARY KEY (section, name))"),
     },
     {
+        // Read with tolerance, of which something may be left out.
+        QStringLiteral("ALTER TABLE file ADD COLUMN is_damaged SMALLINT NOT NULL DEFAULT 0"),
         // Of several files of one image in a study one is shown: the one registered last, which has the greatest number.
         QStringLiteral("CREATE TABLE registration (last BIGINT NOT NULL)"),
         QStringLiteral("INSERT INTO registration (last) VALUES (0)"),

@@ -9,6 +9,17 @@
 namespace Kdd
 {
 
+namespace
+{
+
+FileIdentity identityOf(const struct stat& status)
+{
+    return {status.st_dev, status.st_ino, status.st_size,
+            status.st_mtim.tv_sec * qint64(1'000'000'000) + status.st_mtim.tv_nsec};
+}
+
+}  // namespace
+
 RandomAccessFile::~RandomAccessFile()
 {
     if (mDescriptor >= 0)
@@ -28,8 +39,14 @@ int RandomAccessFile::open(const char* path)
         return EISDIR;
     if (!S_ISREG(status.st_mode))
         return EINVAL;
-    mSize = status.st_size;
+    mIdentity = identityOf(status);
     return 0;
+}
+
+bool RandomAccessFile::isUnchanged() const
+{
+    struct stat status = {};
+    return ::fstat(mDescriptor, &status) == 0 && identityOf(status) == mIdentity;
 }
 
 qint64 RandomAccessFile::readAt(qint64 offset, void* bytes, qint64 count) const

@@ -7,6 +7,21 @@
 namespace Kdd
 {
 
+/// Which file it is, in which state: what is written to it, or put in its place, makes another.
+struct FileIdentity
+{
+    quint64 device = 0;
+    quint64 inode = 0;
+    qint64 size = 0;      ///< [bytes]
+    qint64 modified = 0;  ///< [ns] since the epoch
+
+    bool operator==(const FileIdentity& other) const
+    {
+        return device == other.device && inode == other.inode && size == other.size &&
+               modified == other.modified;
+    }
+};
+
 /// A file read at any place, without a position of its own. Closed when the object goes.
 class KDD_EXPORT RandomAccessFile
 {
@@ -20,14 +35,20 @@ public:
     int open(const char* path);
 
     /// [bytes], as it was when the file was opened.
-    qint64 size() const { return mSize; }
+    qint64 size() const { return mIdentity.size; }
+
+    /// As it was when the file was opened.
+    const FileIdentity& identity() const { return mIdentity; }
+
+    /// Whether it still is as it was.
+    bool isUnchanged() const;
 
     /// Reads up to `count` bytes at `offset`, fewer only at the end of the file; -1 on a read error.
     qint64 readAt(qint64 offset, void* bytes, qint64 count) const;
 
 private:
     int mDescriptor = -1;
-    qint64 mSize = 0;
+    FileIdentity mIdentity;
 };
 
 }  // namespace Kdd

@@ -2,6 +2,8 @@
 
 #include <syslog.h>
 
+#include <algorithm>
+
 namespace Kdd
 {
 
@@ -28,7 +30,12 @@ int priorityOf(LogFile::Severity severity)
 void writeToSystemLog(LogFile::Severity severity, const char* category, const std::string& line)
 {
     const std::string prefix = *category != '\0' ? std::string("[") + category + "] " : std::string();
-    syslog(LOG_USER | priorityOf(severity), "%s%s", prefix.c_str(), line.c_str());
+    for (std::size_t start = 0; start <= line.size();) {
+        const std::size_t end = std::min(line.find('\n', start), line.size());
+        const std::string part = line.substr(start, end - start);
+        syslog(LOG_USER | priorityOf(severity), "%s%s", prefix.c_str(), part.c_str());
+        start = end + 1;
+    }
 }
 
 }  // namespace Kdd

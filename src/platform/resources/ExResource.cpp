@@ -34,7 +34,9 @@ constexpr Setting kFileCacheFolder = {"KDD_FILE_CACHE", "folders/filecache", ""}
 constexpr Setting kTlsVerify = {"KDD_TLS_VERIFY", "tls/verify", "0"};
 constexpr Setting kTlsCaFile = {"KDD_TLS_CA_FILE", "tls/cafile", ""};
 constexpr Setting kSettleSeconds = {"KDD_SETTLE_SECONDS", "archive/settleseconds", "300"};
-constexpr Setting kShareConnections = {"KDD_SHARE_CONNECTIONS", "web/shareconnections", "1"};
+constexpr Setting kReadPatience = {"KDD_READ_PATIENCE", "tagfiles/readpatience", "2000"};
+constexpr Setting kSessionHosts = {"KDD_SESSION_HOSTS", "web/sessionhosts", ""};
+constexpr Setting kShareConnections = {"KDD_SHARE_CONNECTIONS", "web/shareconnections", "0"};
 
 using Values = QHash<QString, QByteArray>;
 
@@ -134,6 +136,24 @@ QByteArray ExResource::tlsCaFile()
     return valueOf(kTlsCaFile);
 }
 
+int ExResource::readPatience()
+{
+    constexpr int kMost = 600000;
+    const QByteArray text = valueOf(kReadPatience);
+    bool isNumber = false;
+    const int patience = text.toInt(&isNumber);
+    if (isNumber && patience >= 0 && patience <= kMost)
+        return patience;
+    LogFile::warnf("%s is \"%s\", which is no number of 0 to %d", kReadPatience.variable, text.constData(),
+                   kMost);
+    return QByteArray(kReadPatience.standard).toInt();
+}
+
+QByteArray ExResource::sessionHosts()
+{
+    return valueOf(kSessionHosts);
+}
+
 int ExResource::settleSeconds()
 {
     const QByteArray value = valueOf(kSettleSeconds);
@@ -148,7 +168,7 @@ int ExResource::settleSeconds()
 
 bool ExResource::sharesConnections()
 {
-    return valueOf(kShareConnections) != "0";
+    return valueOf(kShareConnections) == "1";
 }
 
 }  // namespace Kdd

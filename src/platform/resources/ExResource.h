@@ -52,12 +52,20 @@ public:
     /// that the system trusts.
     static QByteArray tlsCaFile();
 
+    /// How long whoever serves others tries to read a tag file that others hold [ms], 0 to 600000; 400 are tried in any
+    /// case. A merge into the largest studies takes a second or two. KDD_READ_PATIENCE, tagfiles/readpatience, "2000".
+    static int readPatience();
+
+    /// The hosts that are told the session's id, separated by commas or blanks, with a port where only that one is
+    /// meant. KDD_SESSION_HOSTS, web/sessionhosts, empty: all but the cloud storage and the places of tokens.
+    static QByteArray sessionHosts();
+
     /// How long after the last arrival a study that was merged is built once more [s]. KDD_SETTLE_SECONDS,
     /// archive/settleseconds, "300".
     static int settleSeconds();
 
-    /// Whether all threads use one set of connections: not when the value is 0. KDD_SHARE_CONNECTIONS,
-    /// web/shareconnections, "1".
+    /// Whether all threads use one set of connections, which libcurl does not support and which ends the process under
+    /// load: only when the value is 1. KDD_SHARE_CONNECTIONS, web/shareconnections, "0".
     static bool sharesConnections();
 };
 

@@ -48,6 +48,23 @@ LookupTable tableOf(const ImageAttributes& attributes, const DcmTagKey& group, c
     return table;
 }
 
+/// X-ray angiograms and fluoroscopies may bring a table that leads from logarithmic values back to intensities, for
+/// measurements. What is shown is the logarithm, and of the intensities nearly all would be white.
+bool isForMeasuring(const ImageAttributes& attributes)
+{
+    DcmItem& dataset = attributes.dataset();
+    const QByteArray modality = textOf(dataset, DCM_Modality);
+    return (modality == "XA" || modality == "RF") && textOf(dataset, DCM_PixelIntensityRelationship) == "LOG";
+}
+
+/// The table that makes of stored values those that the windows speak of; empty when there is none.
+LookupTable modalityTableOf(const ImageAttributes& attributes, bool hasSign)
+{
+    return isForMeasuring(attributes)
+               ? LookupTable()
+               : tableOf(attributes, DCM_UndefinedTagKey, DCM_ModalityLUTSequence, hasSign);
+}
+
 /// Padding of whole numbers is written as US or SS, whatever the pixels are; the same bits count.
 double asPixel(double padding, PrimitiveType type)
 {
@@ -88,8 +105,7 @@ ShownPixels showGrey(DcmItem& dataset, int frame, const StoredFrame& stored, int
     const PrimitiveType type = stored.pixels.type;
     Rescale rescale = rescaleOf(attributes);
     ShownPixels shown{stored.pixels, rangeOf(stored.pixels, paddingOf(attributes, type))};
-    const LookupTable modality =
-        tableOf(attributes, DCM_UndefinedTagKey, DCM_ModalityLUTSequence, isSigned(type));
+    const LookupTable modality = modalityTableOf(attributes, isSigned(type));
     if (!modality.isEmpty()) {
         shown.pixels = modality.appliedTo(stored.pixels);
         shown.range = rangeOf(shown.pixels);

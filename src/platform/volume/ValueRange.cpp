@@ -49,7 +49,9 @@ ValueRange rangeOf(const TypedData2D& pixels, const ValueRange& padding)
     return visitPixelType(pixels.type, [&](auto zero) {
         using T = decltype(zero);
         const ValueRange range = rangeWithout<T>(pixels, padding);
-        return range.isEmpty() && !padding.isEmpty() ? rangeWithout<T>(pixels, {}) : range;
+        // A mask of which one value is declared as padding shows nothing without it.
+        const bool isFlat = !(range.lowest < range.highest);
+        return isFlat && !padding.isEmpty() ? rangeWithout<T>(pixels, {}) : range;
     });
 }
 

@@ -27,7 +27,8 @@ struct ValueRange
 /// As a float; the nearest one for what floats do not reach.
 float toFloat(double value);
 
-/// The range of all finite numbers of a picture but those in `padding`; of all finite ones when nothing else is there.
+/// The range of all finite numbers of a picture but those in `padding`; of all finite ones when there are not two
+/// different numbers else.
 ValueRange rangeOf(const TypedData2D& pixels, const ValueRange& padding = {});
 
 }  // namespace Kdd

@@ -34,6 +34,7 @@ struct OrlanMeshWriter::Private
     Handle dataSections;
     ChunkedData data;
     std::vector<bool> isWritten;  // one for each slice
+    int numDataSections = 0;
 
     Result createFile();
     Result start();
@@ -152,6 +153,8 @@ Result OrlanMeshWriter::writeDataSection(const QByteArray& name, const QVector<q
     Result result;
     if (!isName(name) || counts.isEmpty() || counts.size() > kMaxCounts)
         result = Result::failure(QStringLiteral("has a wrong name or not 1 to %1 counts").arg(kMaxCounts));
+    if (result.good() && mPrivate->numDataSections >= kMaxDataSections)
+        result = Result::failure(QStringLiteral("is one of more than %1").arg(kMaxDataSections));
     if (result.good() && !mPrivate->dataSections.isOpen())
         result = createGroup(mPrivate->file.id(), kDataSectionsGroup, mPrivate->dataSections);
     ChunkedData data;
@@ -162,6 +165,7 @@ Result OrlanMeshWriter::writeDataSection(const QByteArray& name, const QVector<q
     if (result.good())
         result = data.writeChunk(
             {0}, QByteArray::fromRawData(reinterpret_cast<const char*>(counts.constData()), size));
+    mPrivate->numDataSections += result.good() ? 1 : 0;
     return mPrivate->answer(
         result.within(QStringLiteral("data section \"%1\"").arg(QString::fromUtf8(name))));
 }

@@ -68,7 +68,7 @@ void report(const GlobalOptions& options, const FileScan& scan, const StudyIntak
 
 }  // namespace
 
-Outcome runAdd(const GlobalOptions& options, const QList<QByteArray>& paths)
+Outcome runAdd(const GlobalOptions& options, const ScanRequest& request)
 {
     const std::unique_ptr<Kxg::Catalogue> database = openDatabase();
     if (database == nullptr)
@@ -77,9 +77,11 @@ Outcome runAdd(const GlobalOptions& options, const QList<QByteArray>& paths)
     FileScan scan(*database, progress);
     scan.setOwnPlaces(ownPlaces(options));
     scan.setNamesSkipped(options.verbose);
+    scan.setDamage(request.tolerant ? Damage::Tolerated : Damage::Refused);
     StudyIntake intake(*database, progress);
-    const bool isDone = scan.run(paths, [&](DicomInput input) { return intake.take(std::move(input)); }) &&
-                        intake.finish() && (scan.unchanged() == 0 || intake.completeWaiting(paths));
+    const bool isDone =
+        scan.run(request.paths, [&](DicomInput input) { return intake.take(std::move(input)); }) &&
+        intake.finish() && (scan.unchanged() == 0 || intake.completeWaiting(request.paths));
     report(options, scan, intake);
     const QByteArray finished = QByteArray::number(intake.studies().size()) + " studies are complete";
     const bool isWhole =

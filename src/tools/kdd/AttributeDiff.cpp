@@ -72,7 +72,7 @@ private:
         if (left.numItems() != right.numItems())
             return true;
         for (int i = 0; i < left.numItems(); ++i)
-            compare(*left.item(i), *right.item(i), path + '[' + QByteArray::number(i) + "].");
+            compare(left.itemToRead(i), right.itemToRead(i), path + '[' + QByteArray::number(i) + "].");
         return false;
     }
 

@@ -64,10 +64,17 @@ struct PreviewsRequest
     QString sheet;  ///< file of the contact sheet; empty for none
 };
 
+struct ScanRequest
+{
+    QList<QByteArray> paths;
+    bool tolerant = false;  ///< of damaged DICOM files take what is sound
+};
+
 struct StackRequest
 {
     StudySelection selection;
     bool again = false;  ///< also series that have volume files already
+    bool ignoresFrameOfReference = false;
 };
 
 /// Which studies are listed; an empty text lets all pass.
@@ -101,8 +108,8 @@ struct CorrectionRequest
     QString imageList;  ///< file that names further images, one on each line; empty for none
 };
 
-Outcome runAdd(const GlobalOptions& options, const QList<QByteArray>& paths);
-Outcome runIndex(const GlobalOptions& options, const QList<QByteArray>& paths);
+Outcome runAdd(const GlobalOptions& options, const ScanRequest& request);
+Outcome runIndex(const GlobalOptions& options, const ScanRequest& request);
 Outcome runBuild(const GlobalOptions& options, const BuildRequest& request);
 Outcome runSync(const GlobalOptions& options, const QByteArray& study);
 Outcome runCorrection(const GlobalOptions& options, const CorrectionRequest& request);

@@ -33,7 +33,7 @@ bool readNamed(const QString& name, TagFile& file)
     if (isTagFile(name))
         return readTagFile(name, file);
     const QByteArray path = name.toLocal8Bit();
-    DicomInput input = readDicomInput(path);
+    DicomInput input = readDicomInput(path, Damage::Refused);
     if (input.kind == DicomInput::Kind::Image)
         return file.addTagMap(input.map.release(), path.constData(), true) != nullptr;
     LogFile::errorf("Could not load %s: %s", qUtf8Printable(name), qUtf8Printable(input.reason));

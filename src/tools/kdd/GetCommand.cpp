@@ -27,7 +27,10 @@ constexpr int kRange = 8 * 1024 * 1024;  // [bytes]
 /// The last part of the URL's path; empty when it ends in "/".
 QString nameInUrl(const QByteArray& url)
 {
-    const QByteArray path = url.split('?').first().mid(url.indexOf(':') + 1);
+    // In a URL of HTTP "#" ends the path, in an object's name it is a letter.
+    const bool isCloud = url.startsWith("gs:");
+    const QByteArray path =
+        url.split('?').first().split(isCloud ? '?' : '#').first().mid(url.indexOf(':') + 1);
     return QUrl::fromPercentEncoding(path.mid(path.lastIndexOf('/') + 1))
         .replace(QLatin1Char('/'), QLatin1Char('_'));
 }
@@ -108,7 +111,7 @@ bool Fetch::goOn()
     const qint64 size = mFile.size();
     if (!known.isRecognisable() || known.url != mRequest.url || size == 0 || size >= known.length)
         return false;
-    mStream = KxCurlClient::instance().readFrom(mRequest.url.toStdString(), size);
+    mStream = KxCurlClient::instance().readFollowing(mRequest.url.toStdString(), size);
     const bool isSame = hasContent() && origin().version == known.version && origin().length == known.length;
     if (isSame && mFile.goToEnd())
         mResumedAt = size;
@@ -117,7 +120,7 @@ bool Fetch::goOn()
 
 bool Fetch::beginAnew()
 {
-    mStream = KxCurlClient::instance().read(mRequest.url.toStdString(), true);
+    mStream = KxCurlClient::instance().readFollowing(mRequest.url.toStdString());
     // A page that tells of an error never gets into the file, and what was fetched before stays.
     return hasContent() ? mFile.startOver(origin()) : explain();
 }

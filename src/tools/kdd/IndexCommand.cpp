@@ -12,7 +12,7 @@
 namespace Kdd
 {
 
-Outcome runIndex(const GlobalOptions& options, const QList<QByteArray>& paths)
+Outcome runIndex(const GlobalOptions& options, const ScanRequest& request)
 {
     const std::unique_ptr<Kxg::Catalogue> database = openDatabase();
     if (database == nullptr)
@@ -21,9 +21,11 @@ Outcome runIndex(const GlobalOptions& options, const QList<QByteArray>& paths)
     FileScan scan(*database, progress);
     scan.setOwnPlaces(ownPlaces(options));
     scan.setNamesSkipped(options.verbose);
+    scan.setDamage(request.tolerant ? Damage::Tolerated : Damage::Refused);
     Registration registration(*database);
-    const bool isDone = scan.run(paths, [&](const DicomInput& input) { return registration.add(input); }) &&
-                        registration.flush();
+    const bool isDone = scan.run(request.paths, [&](const DicomInput& input) {
+        return registration.add(input);
+    }) && registration.flush();
     const int studies = registration.studies().size();
     const int failed = static_cast<int>(scan.refused().size());
     if (options.json) {

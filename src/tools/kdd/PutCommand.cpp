@@ -41,6 +41,7 @@ Result upload(QFile& file, const QByteArray& url, Progress& progress)
 {
     try {
         KxCurlUploadStream stream = KxCurlClient::instance().write(url.toStdString());
+        stream.leaveErrorsToCaller();
         return send(file, stream, progress);
     } catch (const std::invalid_argument&) {
         throw;

@@ -49,7 +49,9 @@ Outcome runStack(const GlobalOptions& options, const StackRequest& request)
     int volumes = 0;
     int studies = 0;
     CommandProgress progress("Stacking", !options.quiet);
-    StudyStacker stacker(*database, {options.volumeFolder(), request.again});
+    StudyStacker stacker(
+        *database, {options.volumeFolder(), request.again,
+                    request.ignoresFrameOfReference ? FrameOfReference::Ignored : FrameOfReference::Shared});
     for (const QByteArray& studyUID : qAsConst(studyUIDs)) {
         if (progress.isCancelled())
             break;

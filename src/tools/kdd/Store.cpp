@@ -55,7 +55,7 @@ bool readStudy(const QByteArray& text, TagFile& file)
 
 bool readStudyFile(const QByteArray& studyUID, TagFile& file)
 {
-    if (file.readCacheFileForStudy(studyUID.constData(), false))
+    if (file.readWhenFreeForStudy(studyUID.constData(), false))
         return true;
     const QString path = TagFile::cacheFilePathForStudy(studyUID.constData());
     const QString reason = QFileInfo(path).size() == 0 && QFileInfo::exists(path)
@@ -68,9 +68,9 @@ bool readStudyFile(const QByteArray& studyUID, TagFile& file)
 
 bool readTagFile(const QString& path, TagFile& file)
 {
-    if (file.readCacheFile(path, nullptr, false))
+    if (file.readWhenFree(path, nullptr, false))
         return true;
-    if (!QFileInfo::exists(path))
+    if (!QFileInfo::exists(path) || file.wasLockedOut())
         LogFile::errorf("Could not open %s: %s", qUtf8Printable(path), qUtf8Printable(file.failure()));
     return false;
 }

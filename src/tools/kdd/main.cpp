@@ -100,6 +100,9 @@ void applyLogging(const GlobalOptions& global)
     LogFile::setLevel(global.quiet     ? LogFile::Level::Errors
                       : global.verbose ? LogFile::Level::Timing
                                        : LogFile::Level::Warnings);
+    // Each command tells itself why a transfer failed, and of what.
+    if (!global.verbose)
+        LogFile::dropTraces("CURL");
     // DCMTK's own lines do not name the file; what matters of them is told with it.
     OFLog::configure(global.verbose ? OFLogger::WARN_LOG_LEVEL : OFLogger::OFF_LOG_LEVEL);
 }
@@ -171,7 +174,13 @@ private:
         return list;
     }
 
-    void addPaths(CLI::App& command) { command.add_option("PATH", mPaths, "Files and folders")->required(); }
+    void addPaths(CLI::App& command)
+    {
+        command.add_option("PATH", mPaths, "Files and folders")->required();
+        command.add_flag(
+            "--tolerant", mTolerant,
+            "Of damaged DICOM files take what is sound, with a warning that says what is left out");
+    }
 
     void addStudies(CLI::App& command)
     {
@@ -182,9 +191,13 @@ private:
     void declareTaking()
     {
         addPaths(declare("add", "Take the DICOM and volume files below the paths into database and tag files",
-                         [this] { return runAdd(mGlobal, paths()); }));
+                         [this] {
+                             return runAdd(mGlobal, {paths(), mTolerant});
+                         }));
         addPaths(declare("index", "Register the DICOM and volume files below the paths in the database only",
-                         [this] { return runIndex(mGlobal, paths()); }));
+                         [this] {
+                             return runIndex(mGlobal, {paths(), mTolerant});
+                         }));
         CLI::App& build =
             declare("build", "Build the tag files of studies that wait for it, or of those named", [this] {
                 return runBuild(mGlobal, {studies(), mAgain, mSettle, !mNoOptimize, mJobs});
@@ -196,10 +209,13 @@ private:
         build.add_flag("--no-optimize", mNoOptimize, "Leave every attribute where it was found");
         build.add_option("--jobs", mJobs, "Studies built at once")->check(CLI::Range(1, 256));
         CLI::App& stack = declare("stack", "Make volume files from the series that can be stacked", [this] {
-            return runStack(mGlobal, {studies(), mAgain});
+            return runStack(mGlobal, {studies(), mAgain, mIgnoresFrameOfReference});
         });
         addStudies(stack);
         stack.add_flag("--again", mAgain, "Also series that have volume files already");
+        stack.add_flag(
+            "--ignore-frame-of-reference", mIgnoresFrameOfReference,
+            "Also stack slices that have different Frames of Reference, as anonymisers leave them");
     }
 
     void declareStoring()
@@ -323,6 +339,8 @@ private:
     bool mAll = false;
     bool mAgain = false;
     bool mSettle = false;
+    bool mTolerant = false;
+    bool mIgnoresFrameOfReference = false;
     bool mNoOptimize = false;
     int mJobs = 1;
 };

@@ -37,4 +37,13 @@ TEST(Exports, AreTheFunctionsOfTheCInterfaceAndClassesOfOurs)
     EXPECT_EQ(functions.join(QLatin1Char(' ')).toStdString(), kFunctions);
 }
 
+TEST(Exports, HaveTheStreamsThatFeedTheParser)
+{
+    const QString all = exports().join(QLatin1Char('\n'));
+    for (const char* name :
+         {"Kdd::DcmInputCurlStream::DcmInputCurlStream(", "Kdd::DcmInputHttpStream::DcmInputHttpStream(",
+          "Kdd::DcmHttpProducer::request(", "vtable for Kdd::DownloadProducer"})
+        EXPECT_TRUE(all.contains(QLatin1String(name))) << name;
+}
+
 }  // namespace

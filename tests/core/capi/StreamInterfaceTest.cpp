@@ -172,6 +172,7 @@ TEST(StreamAddresses, AreToldByTheirBeginningsAndOnlyTheCloudsAreDeleted)
     qputenv("KDD_CLOUD_API", cloud.url("").c_str());
     EXPECT_TRUE(DeleteObject("gs://b/there"));
     EXPECT_FALSE(DeleteObject("gs://b/absent"));
+    EXPECT_FALSE(DeleteObject("gs://b/there?x")) << "nor what comes before";
     qputenv("KDD_CLOUD_API", "http://127.0.0.1:1/");
     const LogCapture log;
     EXPECT_FALSE(DeleteObject("gs://b/there"));

@@ -144,7 +144,8 @@ TEST_F(TagFileInterface, NullsAndNegativeCountsAreRefusedWithALineEach)
 {
     TagFile::setDebugOptions(6);
     ConfigureLogging(flags, "sqlite:/nowhere");
-    LogFile::tracef(0, "TagMerge", "done");
+    TagFile().readCacheFile(QStringLiteral("/absent"), "1.2", false);
+    LogFile::tracef(0, "TagMerge", "done\nhere");
     const bool isReplaced = TagFile::debugOption(1) == (flags >= 2) && !TagFile::debugOption(6);
     std::exit(isReplaced && Kxg::DatabaseServer() == "sqlite:/nowhere" ? 0 : 1);
 }
@@ -153,10 +154,12 @@ TEST(LoggingInterface, DebugGoesToStandardErrorAndAllElseToTheSystemsLog)
 {
     testing::GTEST_FLAG(death_test_style) = "threadsafe";
     const std::pair<short, const char*> cases[] = {
-        {0, "<15>\\[TagMerge\\] done\n"},
-        {1, "[^<]*Configure logging: debug=1 timings=0\n[^<]*\\[TagMerge\\] done\n"},
-        {2, "<15>\\[TagMerge\\] done\n"},
-        {3, "[^<]*Configure logging: debug=1 timings=1\n[^<]*\\[TagMerge\\] done\n"},
+        {0, "<15>\\[TagMerge\\] done\n<15>\\[TagMerge\\] here\n"},
+        {1, "[^<]*Configure logging: debug=1 timings=0\n[^<]*Could not open /absent: [^<]*\\[TagMerge\\] "
+            "done\nhere\n"},
+        {2, "<15>\\[TagMerge\\] done\n<15>\\[TagMerge\\] here\n"},
+        {3, "[^<]*Configure logging: debug=1 timings=1\n[^<]*Could not open /absent: [^<]*\\[TagMerge\\] "
+            "done\nhere\n"},
     };
     for (const auto& [flags, written] : cases)
         EXPECT_EXIT(configureAndLog(flags), testing::ExitedWithCode(0), testing::MatchesRegex(written));

@@ -74,6 +74,24 @@ TEST_F(UpdateTagFileTest, TakesWideTexts)
     EXPECT_TRUE(UpdateTagFileW(kWideJob, L"1.2", 1, wideImages, nullptr));
 }
 
+TEST_F(UpdateTagFileTest, AWideTextIsItsTextWhateverEncodingItDeclares)
+{
+    const wchar_t* wideImages[] = {L"2"};
+    const std::wstring job(kWideJob);
+    for (const wchar_t* declared :
+         {L"<?xml version='1.0' encoding='ISO-8859-1'?>", L"<?xml version='1.0' encoding='utf-16'?>",
+          L"\ufeff<?xml version='1.0'?>"}) {
+        const char* all[] = {"2"};
+        ASSERT_TRUE(
+            UpdateTagFile("<Tag Group='8' Element='103E'><Value>x</Value></Tag>", "1.2", 1, all, nullptr));
+        EXPECT_TRUE(UpdateTagFileW((declared + job).c_str(), L"1.2", 1, wideImages, nullptr));
+        EXPECT_EQ(textOf("2", DCM_SeriesDescription), "caf\xe9");
+    }
+    const LogCapture log;
+    EXPECT_FALSE(UpdateTagFileW(L"<Login>\xd800</Login>", L"1.2", 1, wideImages, nullptr));
+    EXPECT_EQ(log.count("half a character"), 1);
+}
+
 TEST_F(UpdateTagFileTest, SaysInALineWhatWentWrong)
 {
     QFile held;

@@ -1,7 +1,9 @@
 #include "kddlib/net/CurlError.h"
 #include "kddlib/net/CurlShare.h"
 #include "kddlib/net/KxCurlClient.h"
+#include "kddlib/net/KxCurlDownloadStream.h"
 #include "kddlib/net/KxCurlRequest.h"
+#include "kddlib/net/KxCurlUploadStream.h"
 #include "support/HttpServer.h"
 #include "support/LogCapture.h"
 
@@ -10,6 +12,8 @@
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+
+#include <set>
 
 using namespace Kdd;
 using testing::EndsWith;
@@ -105,6 +109,69 @@ TEST_F(Client, DeletesCloudObjectsAndNothingElse)
     EXPECT_THROW(client.deleteObject("gs://b/x"), CurlError);
 }
 
+TEST_F(Client, SendsNothingToAnAddressThatIsNoObjectsOwn)
+{
+    const LogCapture log;
+    qputenv("KDD_CLOUD_API", server.url("").c_str());
+    qputenv("KDD_CLOUD_UPLOAD", server.url("").c_str());
+    for (const char* address : {"gs://b/o?generation=5", "gs://b", "gs://b/..", "gs://b/5%", "gs://b#/o"}) {
+        EXPECT_THROW(client.deleteObject(address), std::invalid_argument) << address;
+        EXPECT_THROW(client.write(address), std::invalid_argument) << address;
+    }
+    EXPECT_TRUE(server.requests().empty());
+    EXPECT_TRUE(client.deleteObject("gs://b/scan#1 a.dcm"));
+    EXPECT_THAT(lastRequest(), StartsWith("DELETE /b/scan%231%20a.dcm HTTP/1.1\r\n"));
+    qunsetenv("KDD_CLOUD_UPLOAD");
+    EXPECT_THROW(client.readBytes(server.url(std::string("a\0b", 3)), status), CurlError);
+    client.readBytes(server.url("a/../b"), status);
+    EXPECT_THAT(lastRequest(), StartsWith("GET /a/../b HTTP/1.1\r\n"));
+}
+
+TEST_F(Client, TellsWhyATransferFailed)
+{
+    const LogCapture log;
+    client.readBytes("http://127.0.0.1:1/x", status);
+    EXPECT_TRUE(status.failed);
+    EXPECT_THAT(status.failure, HasSubstr("Failed to connect"));
+}
+
+QByteArray redirectTo(const std::string& url)
+{
+    return "HTTP/1.1 302 Found\r\nContent-Length: 4\r\nLocation: " + QByteArray::fromStdString(url) +
+           "\r\n\r\npage";
+}
+
+TEST_F(Client, FollowsRedirectsAndTellsOthersNothing)
+{
+    ScriptedServer first([this](const QByteArray& request) -> ScriptedServer::Reply {
+        return {redirectTo(request.startsWith("GET /a?") ? "/b?x=1" : server.url("c"))};
+    });
+    client.setSessionID("12");
+    KxCurlDownloadStream stream = client.readFollowing(first.url("a"), 1);
+    EXPECT_EQ(first.requests().size(), 2U);
+    EXPECT_THAT(first.requests().at(1).toStdString(), StartsWith("GET /b?x=1&s=12 HTTP"));
+    EXPECT_THAT(lastRequest(), StartsWith("GET /c HTTP/1.1\r\n"));
+    EXPECT_THAT(lastRequest(), HasSubstr("\r\nRange: bytes=1-\r\n"));
+    EXPECT_EQ(stream.httpStatus().failure, "The server sends the whole object where a range was asked for");
+    EXPECT_EQ(client.readFollowing(first.url("a")).httpStatus().code, 200);
+}
+
+TEST_F(Client, FollowsNoRedirectThatLeadsAstray)
+{
+    const NginxServer secure(NginxServer::Scheme::Https, "location / { return 302 http://127.0.0.1:1/; }");
+    std::string target;
+    ScriptedServer endless([&](const QByteArray&) -> ScriptedServer::Reply { return {redirectTo(target)}; });
+    const LogCapture log;
+    const auto failure = [&](const std::string& url) { return client.readFollowing(url).failure(); };
+    EXPECT_EQ(failure(secure.url("")), "The server redirects from HTTPS to \"http://127.0.0.1:1/\"");
+    target = "file:///etc/passwd";
+    EXPECT_THAT(failure(endless.url("")), HasSubstr("\"file:///etc/passwd\", which is no address of HTTP"));
+    target = "/again";
+    const std::size_t before = endless.requests().size();
+    EXPECT_EQ(failure(endless.url("")), "The server redirects more than 5 times");
+    EXPECT_EQ(endless.requests().size() - before, 6U);
+}
+
 class ManyThreads : public testing::TestWithParam<CurlShare::Connections>
 {
 };
@@ -125,6 +192,43 @@ TEST_P(ManyThreads, GetEachItsOwnAnswer)
         });
     for (std::thread& thread : threads)
         thread.join();
+}
+
+TEST_F(Client, NeedsNoMoreConnectionsThanThreads)
+{
+    constexpr int kThreads = 6;
+    const NginxServer nginx(NginxServer::Scheme::Http, "location / { return 200 $connection; }");
+    std::mutex mutex;
+    std::set<QByteArray> connections;
+    std::vector<std::thread> threads;
+    for (int i = 0; i < kThreads; ++i)
+        threads.emplace_back([&] {
+            for (int round = 0; round < 30; ++round) {
+                KxHttpStatus own;
+                const QByteArray connection = client.readBytes(nginx.url("x"), own);
+                const std::lock_guard lock(mutex);
+                connections.insert(connection);
+            }
+        });
+    for (std::thread& thread : threads)
+        thread.join();
+    EXPECT_LE(connections.size(), std::size_t(kThreads));
+}
+
+TEST_F(Client, DeletesOverOneConnection)
+{
+    const LogCapture log;
+    const NginxServer nginx(NginxServer::Scheme::Http, "location = /accepted { stub_status; }"
+                                                       "location /b/ { return 204; }");
+    qputenv("KDD_CLOUD_API", nginx.url("").c_str());
+    const auto accepted = [&] {
+        return client.readBytes(nginx.url("accepted"), status).split('\n').value(2);
+    };
+    const QByteArray before = accepted();
+    for (int i = 0; i < 5; ++i)
+        EXPECT_TRUE(client.deleteObject("gs://b/x"));
+    EXPECT_EQ(accepted().trimmed().split(' ').first().toInt(),
+              before.trimmed().split(' ').first().toInt() + 1);
 }
 
 INSTANTIATE_TEST_SUITE_P(Net, ManyThreads,

@@ -1,6 +1,7 @@
 #include "kddlib/net/DicomFileReader.h"
 
 #include "kddlib/Limits.h"
+#include "kddlib/net/KxDcmFileLoader.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/tagmodel/TagSequence.h"
 #include "support/LogCapture.h"
@@ -11,6 +12,7 @@
 
 #include <dcmtk/config/osconfig.h>
 
+#include <dcmtk/dcmdata/dcistrmb.h>
 #include <dcmtk/dcmdata/dctk.h>
 #include <gtest/gtest.h>
 
@@ -144,6 +146,20 @@ TEST_P(DeepFile, IsRefusedWhenItNestsDeeper)
     for (const int depth : {kMaxItemDepth + 1, 100000}) {
         const QByteArray bytes = DatasetBytes(GetParam()).nest(0x0008, 0x1140, depth).file();
         EXPECT_STREQ(read(bytes).text(), "Sequence items are nested too deep");
+    }
+}
+
+TEST_P(DeepFile, IsRefusedInACallersOwnStreamAsWell)
+{
+    for (const int depth : {kMaxItemDepth, kMaxItemDepth + 1, 100000}) {
+        const QByteArray bytes = DatasetBytes(GetParam()).nest(0x0008, 0x1140, depth).file();
+        DcmInputBufferStream stream;
+        stream.setBuffer(bytes.constData(), bytes.size());
+        stream.setEos();
+        KxDcmFileLoader loader;
+        const bool isAllowed = depth == kMaxItemDepth;
+        EXPECT_STREQ(loader.read(stream).text(), isAllowed ? "Normal" : "Sequence items are nested too deep");
+        EXPECT_EQ(stream.eos(), isAllowed);
     }
 }
 

@@ -8,6 +8,7 @@
 #include "support/LogCapture.h"
 #include "support/RealFiles.h"
 
+#include <QDateTime>
 #include <QFile>
 #include <QTemporaryDir>
 
@@ -142,6 +143,49 @@ TEST_F(DicomUrl, TellsOfARefusalOnce)
     EXPECT_STREQ(unasked.status().text(), "Logical error on IO operation");
 }
 
+TEST_F(DicomUrl, TellsWhyATransferFailed)
+{
+    const LogCapture log;
+    EXPECT_EQ(KxDcmFileLoader().loadFile("http://127.0.0.1:1/a"), EC_InvalidStream);
+    EXPECT_EQ(log.count("Reading http://127.0.0.1:1/a failed: Failed to connect"), 1);
+    EXPECT_EQ(Loader::loadDcmDataset("http://127.0.0.1:1/a", 100), nullptr);
+    EXPECT_EQ(log.count("Could not open http://127.0.0.1:1/a: Failed to connect"), 1);
+    const ScriptedServer server(
+        [&](const QByteArray&) -> ScriptedServer::Reply { return {withLength(bytes, 1000)}; });
+    EXPECT_TRUE(KxDcmFileLoader().loadFile(server.url("a").c_str()).bad());
+    EXPECT_EQ(log.count("Reading " + server.url("a") + " failed: transfer closed with 1000 bytes"), 1);
+}
+
+TEST_F(DicomUrl, AValueThatWasLeftInAFileDoesNotComeFromAnother)
+{
+    for (const bool isReplaced : {false, true}) {
+        KxDcmFileLoader loader(Mode::BoundedLocal);
+        ASSERT_TRUE(loader.loadFile(path().c_str()).good());
+        const QByteArray other = QByteArray(bytes).replace("tttt", "uuuu");
+        QFile file(folder.filePath(QStringLiteral("a.dcm")));
+        EXPECT_TRUE(!isReplaced || file.remove());
+        ASSERT_TRUE(file.open(QIODevice::ReadWrite) && file.write(other) == other.size() && file.flush());
+        // Else both may fall into one tick of the file system's clock.
+        file.setFileTime(QDateTime::fromSecsSinceEpoch(isReplaced ? 1 : 2), QFile::FileModificationTime);
+        file.close();
+        OFString value;
+        EXPECT_TRUE(loader.getDataset()->findAndGetOFStringArray(DCM_TextValue, value).bad());
+        EXPECT_STREQ(loader.readUntilEnd().text(), "The file has changed since it was opened");
+    }
+}
+
+TEST_F(DicomUrl, TheLibraryLoadsInTheModeThatWasChosen)
+{
+    for (const Mode mode : {Mode::BoundedLocal, Mode::WholeLocal}) {
+        KxDcmFileLoader::setDefaultMode(mode);
+        DcmFileFormat file;
+        ASSERT_TRUE(loadDicomFile(path().c_str(), file).good());
+        std::ostringstream text;
+        file.print(text, DCMTypes::PF_shortenLongTagValues);
+        EXPECT_EQ(text.str().find("(not loaded)") == std::string::npos, mode == Mode::WholeLocal);
+    }
+}
+
 TEST_F(DicomUrl, ALoaderTakesUrlsForPaths)
 {
     const NginxServer server;
@@ -163,6 +207,12 @@ TEST(StoragePaths, BecomeUrls)
         {"\\\\filer\\share\\a\\b.dcm", "http://filer:90/share/a/b.dcm"},
         {"/Storage/filer/share/b.dcm", "http://filer:90/share/b.dcm"},
         {"\\Storage\\filer/x", "http://filer:90/x"},
+        {"//filer/a b/scan#1.dcm", "http://filer:90/a%20b/scan%231.dcm"},
+        {"/Storage/filer/\xc3\xbc%20?x=1", "http://filer:90/%C3%BC%20?x=1"},
+        {"//[::1]/a", "http://[::1]:90/a"},
+        {"//filer:80/a", ""},
+        {"//user@filer/a", ""},
+        {"//fi#ler/a", ""},
         {"/Storage/filer", ""},
         {"//filer", ""},
         {"/data/a.dcm", ""},
@@ -175,6 +225,7 @@ TEST(StoragePaths, BecomeUrls)
         EXPECT_EQ(url, *expected ? expected : path);
     }
     EXPECT_EQ(KxDcmFileLoader::convertPathToExternalURL("//filer/a/b"), KxCurlClient::url("a/b"));
+    EXPECT_EQ(KxDcmFileLoader::convertPathToExternalURL("//filer/a#b c"), KxCurlClient::url("a%23b%20c"));
     EXPECT_EQ(KxDcmFileLoader::convertPathToExternalURL("/data/a"), "");
 }
 

@@ -291,6 +291,23 @@ TEST_F(GoogleAuth, RefusesAnswersWithoutAUsableToken)
     }
 }
 
+TEST_F(GoogleAuth, IsToldNoSession)
+{
+    KxCurlClient::instance().setSessionID("12");
+    ASSERT_TRUE(auth.loadCredentialsFromJson(key(), "test"));
+    EXPECT_FALSE(header().isEmpty());
+    KxCurlClient::instance().setSessionID({});
+    EXPECT_TRUE(server.requests().back().startsWith("POST /token HTTP/1.1\r\n"));
+}
+
+TEST_F(GoogleAuth, TellsWhyThePlaceOfTokensCannotBeReached)
+{
+    const LogCapture log;
+    ASSERT_TRUE(auth.loadCredentialsFromJson(account().key("http://127.0.0.1:1/t"), "test"));
+    EXPECT_EQ(header(), QByteArray());
+    EXPECT_EQ(log.count("from http://127.0.0.1:1/t, response code 0. Failed to connect"), 1);
+}
+
 TEST(CloudClient, AuthorizesWhatItUploadsAndDeletes)
 {
     const LogCapture log;
@@ -315,28 +332,53 @@ TEST(CloudClient, AuthorizesWhatItUploadsAndDeletes)
         EXPECT_THROW(client.write(address), std::invalid_argument) << address;
 }
 
-TEST(CloudClient, AuthorizesEachRangeByTheTokenOfItsTime)
+/// A client that is given another token for each request.
+class ShortTokens : public testing::Test
 {
+protected:
+    ShortTokens() { client.setGoogleAuthentication(account().key(tokens.url(""))); }
+
+    /// How many different tokens the requests carried.
+    static int tokensOf(const std::vector<QByteArray>& requests)
+    {
+        QSet<QByteArray> lines;
+        for (const QByteArray& request : requests)
+            lines.insert(request.mid(request.indexOf("\r\nAuthorization: ") + 2, 26));
+        EXPECT_FALSE(lines.contains(""));
+        return lines.size();
+    }
+
     std::atomic<int> count{0};
-    const ScriptedServer tokens([&](const QByteArray&) -> ScriptedServer::Reply {
+    const ScriptedServer tokens{[this](const QByteArray&) -> ScriptedServer::Reply {
         return {"HTTP/1.1 200 OK\r\n\r\n{\"access_token\":\"t" + QByteArray::number(++count) +
                 "\",\"token_type\":\"Bearer\",\"expires_in\":0}"};
-    });
+    }};
+    KxCurlClient& client = KxCurlClient::instance();
+};
+
+TEST_F(ShortTokens, AuthorizeEachRangeByThatOfItsTime)
+{
     const ObjectServer store(someObject(8000));
     qputenv("KDD_CLOUD_DOWNLOAD", store.origin().c_str());
-    KxCurlClient& client = KxCurlClient::instance();
-    client.setGoogleAuthentication(account().key(tokens.url("")));
     client.setNumConcurrentRequestsPerFile(2);
     client.setChunkSizeForPartialRequests(2000);
     KxHttpStatus status;
     EXPECT_EQ(client.readBytes("gs://b/x", status), someObject(8000));
     qunsetenv("KDD_CLOUD_DOWNLOAD");
     client.setNumConcurrentRequestsPerFile(1);
-    QSet<QByteArray> lines;
-    for (const QByteArray& request : store.requests())
-        lines.insert(request.mid(request.indexOf("\r\nAuthorization: ") + 2, 26));
-    EXPECT_EQ(lines.size(), 4);
-    EXPECT_FALSE(lines.contains(""));
+    EXPECT_EQ(tokensOf(store.requests()), 4);
+}
+
+TEST_F(ShortTokens, AuthorizeEachChunkByThatOfItsTime)
+{
+    const CloudStore store;
+    KxCurlUploadStream stream = client.write("gs://b/long");
+    for (int i = 0; i < 3; ++i)
+        stream << std::string(262'144, 'x') << std::flush;
+    stream.close();
+    EXPECT_TRUE(stream.good());
+    EXPECT_EQ(store.requests().size(), 5U);
+    EXPECT_EQ(tokensOf(store.requests()), 5);
 }
 
 }  // namespace

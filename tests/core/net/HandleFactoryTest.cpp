@@ -47,4 +47,17 @@ TEST(HandleFactory, TakesMultiHandlesFromThePoolOnlyWhileEasyOnesAreIdle)
     EXPECT_EQ(factory.takeMulti().get(), name);
 }
 
+TEST(HandleFactory, LeavesEnoughConnectionsOpenForAllThatShareThem)
+{
+    EXPECT_EQ(KxCurlHandleFactory(48).connectionLimit(), 8);
+    KxCurlHandleFactory factory(2, CurlShare::Connections::Shared);
+    std::vector<CurlEasy> inUse;
+    for (int i = 0; i < 70; ++i)
+        inUse.push_back(factory.takeEasy());
+    EXPECT_GT(factory.connectionLimit(), 70);
+    for (CurlEasy& handle : inUse)
+        factory.giveBack(std::move(handle));
+    EXPECT_EQ(factory.connectionLimit(), 8);
+}
+
 }  // namespace

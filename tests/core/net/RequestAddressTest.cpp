@@ -34,7 +34,11 @@ TEST(RequestAddress, OfTheCloudHasItsObjectEscaped)
         {"gs://scans/2020/study1.dcm", "scans/2020%2Fstudy1.dcm"},
         {"gs:bucket", "bucket"},
         {"gs:///b/x/y", "b/x%2Fy"},
-        {"gs:b/a//b ?", "b/a%2F/b ?"},
+        {"gs:b/a//b ?", "b/a%2F/b%20?"},
+        {"gs://b/scan#1.dcm", "b/scan%231.dcm"},
+        {"gs://b/a\t/\x7f/\xc3\xbc", "b/a%09%2F%7F%2F%C3%BC"},
+        {"gs://b/a%20b?generation=5#x", "b/a%20b?generation=5%23x"},
+        {"gs://b#k/x", "b%23k/x"},
         {"gs:b/x/", "b/x%2F"},
         {"gs://", ""}};
     qputenv("KDD_CLOUD_API", "http://cloud:90");
@@ -42,6 +46,16 @@ TEST(RequestAddress, OfTheCloudHasItsObjectEscaped)
         EXPECT_EQ(cloudUrl(address, CloudEndpoint::Api), std::string("http://cloud:90/") + path);
     EXPECT_EQ(cloudApiHost(), "cloud:90");
     qunsetenv("KDD_CLOUD_API");
+}
+
+TEST(RequestAddress, OfAnObjectThatIsWrittenOrDeletedIsItsNameAndNothingElse)
+{
+    for (const char* good : {"gs:b/o", "gs://b.c-d_e/x/y#1 \xc3\xbc.dcm", "gs://b/50%25", "gs://b/..a/.b"})
+        EXPECT_EQ(whyNoCloudObject(good), "") << good;
+    for (const char* bad :
+         {"https://a/b", "gs://b", "gs://b/", "gs:", "gs://b/o?generation=5", "gs://b/50% off", "gs://b/o%2",
+          "gs://b#c/o", "gs://b c/o", "gs://../o", "gs://b/..", "gs://b/.", "gs://b/%2e.", "gs://b/a//.."})
+        EXPECT_NE(whyNoCloudObject(bad), "") << bad;
 }
 
 TEST(PreparedRequest, CarriesTheSessionEverywhereButToTheCloud)
@@ -54,7 +68,21 @@ TEST(PreparedRequest, CarriesTheSessionEverywhereButToTheCloud)
     settings.sessionId = "7&";
     EXPECT_EQ(urlOf("https://a/b"), "https://a/b?s=7&");
     EXPECT_EQ(urlOf("https://a/b?c"), "https://a/b?c&s=7&");
+    EXPECT_EQ(urlOf("https://a/b#c?d"), "https://a/b?s=7&#c?d");
     EXPECT_EQ(urlOf("gs://a/b"), "https://storage-download.googleapis.com/a/b");
+}
+
+TEST(PreparedRequest, CarriesTheSessionOnlyToHostsThatMayKnowIt)
+{
+    ClientSettings settings;
+    settings.sessionId = "7";
+    qputenv("KDD_SESSION_HOSTS", "Pacs, viewer:8443 [::1]");
+    for (const char* known :
+         {"https://pacs/b", "http://PACS:90/b", "https://viewer:8443/b", "http://[::1]:9/b"})
+        EXPECT_EQ(prepareRequest(known, {}, RequestBody::None, settings).url, std::string(known) + "?s=7");
+    for (const char* other : {"https://viewer/b", "https://a/b", "https://pacs@a/b", "https://pacs.a/b"})
+        EXPECT_EQ(prepareRequest(other, {}, RequestBody::None, settings).url, other);
+    qunsetenv("KDD_SESSION_HOSTS");
 }
 
 TEST(PreparedRequest, CarriesTheHeadersOfTheCloudOnlyWithAuthorization)

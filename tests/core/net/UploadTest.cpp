@@ -44,7 +44,7 @@ protected:
     KxCurlUploadStream open(const std::string& url)
     {
         auto session = std::make_unique<KxCurlUploadSession>(
-            factory, share, UploadTarget{url, "Authorization: Bearer t", {}},
+            factory, share, UploadTarget{url, [this] { return authorization(); }},
             [this](milliseconds delay) { waits.push_back(delay); });
         return KxCurlUploadStream(std::make_unique<KxCurlUploadStreambuf>(std::move(session), capacity));
     }
@@ -80,6 +80,7 @@ protected:
     int capacity = 2 * kStep;
     std::function<int()> pieceSize = [] { return INT_MAX; };
     std::function<bool()> flushes = [] { return false; };
+    std::function<std::string()> authorization = [] { return "Authorization: Bearer t"; };
     CloudStore store;
     CurlShare share{CurlShare::Connections::PerHandle};
     std::shared_ptr<KxCurlHandleFactory> factory = std::make_shared<KxCurlHandleFactory>(1);
@@ -247,6 +248,34 @@ TEST_P(TroubledUpload, EitherLosesNothingOrSaysWhyItEnded)
 
 INSTANTIATE_TEST_SUITE_P(Net, TroubledUpload, testing::ValuesIn(kTroubles),
                          [](const auto& trouble) { return trouble.param.name; });
+
+TEST_F(Upload, TriesAgainWhenThereIsNoTokenForAMoment)
+{
+    int asked = 0;
+    authorization = [&] { return ++asked == 2 ? "" : "Authorization: Bearer t"; };
+    EXPECT_EQ(upload("bytes"), "");
+    EXPECT_EQ(store.object("b/o"), "bytes");
+    EXPECT_EQ(waits.size(), 1U);
+    for (const QByteArray& sent : store.requests())
+        EXPECT_TRUE(sent.contains("\r\nAuthorization: Bearer t\r\n"));
+}
+
+TEST_F(Upload, LogsErrorsInTheirOwnLinesAndLeavesTheLastToTheCallerOnRequest)
+{
+    store.misbehave({kNone, kReset, kReset});
+    EXPECT_EQ(upload("bytes"), "");
+    EXPECT_EQ(log.count("Recevied curl error: Error code: "), 1);
+    EXPECT_EQ(log.count("\nError description: "), 2);
+    for (const bool isTold : {false, true}) {
+        KxCurlUploadStream stream = open();
+        if (!isTold)
+            stream.leaveErrorsToCaller();
+        store.misbehave({{0, "404 Gone"}});
+        stream.close();
+        EXPECT_THAT(stream.error(), HasSubstr("HTTP code 404"));
+        EXPECT_EQ(log.count("Got exception while trying to final flush. Aborting.\nHTTP code 404"), isTold);
+    }
+}
 
 TEST_F(Upload, KeepsTheAuthorizationFromOtherHosts)
 {

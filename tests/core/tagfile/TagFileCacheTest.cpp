@@ -10,6 +10,7 @@
 
 #include <csignal>
 #include <functional>
+#include <future>
 
 using namespace Kdd;
 
@@ -174,6 +175,27 @@ TEST_F(TagFileCache, WhoKeepsItOpenLocksOthersOut)
     EXPECT_TRUE(file.writeCacheFile());
     EXPECT_EQ(inChild([] { return put(5, 5, merge); }), 1);
     EXPECT_EQ(imagesFound(), 4);
+}
+
+TEST_F(TagFileCache, WhoServesWaitsLongerThanOneWhoReads)
+{
+    qputenv("KDD_READ_PATIENCE", "600000");
+    ASSERT_TRUE(put(1, 2, write));
+    for (const bool keepOpen : {false, true}) {
+        TagFile holder;
+        TagFile reader;
+        ASSERT_TRUE(holder.readCacheFileForStudy(kStudy, true));
+        auto serving = std::async(std::launch::async, [keepOpen] {
+            TagFile file;
+            return file.readWhenFreeForStudy(kStudy, keepOpen) && file.imagesByUID().size() == 2;
+        });
+        // Each gives up only when its time is over, so the one that serves has waited longer than that, too.
+        EXPECT_FALSE(reader.readCacheFileForStudy(kStudy, false) ||
+                     reader.readCacheFileForStudy(kStudy, true));
+        EXPECT_TRUE(holder.close());
+        EXPECT_TRUE(serving.get());
+    }
+    qunsetenv("KDD_READ_PATIENCE");
 }
 
 TEST_F(TagFileCache, IsOpenedOnlyOnce)

@@ -32,12 +32,13 @@ const DcmTagKey kPreview(0x0006, 0x7105);
 /// A store of its own and the words in which tests speak of tag files.
 class TagFileTest : public testing::Test
 {
-protected:
+public:
     static TagMap* add(TagFile& file, const DatasetBuilder& image, const char* path = nullptr)
     {
         return file.addTagMap(image.map(), path, true);
     }
 
+protected:
     /// What an image shows that is no part of a tree.
     static std::string shownAlone(const DatasetBuilder& image)
     {

@@ -1,4 +1,6 @@
 #include "TagFileFixture.h"
+#include "kddlib/Limits.h"
+#include "kddlib/tagmodel/TagSequence.h"
 #include "kddlib/volumes/Volume.h"
 #include "platform/base/KxMsg.h"
 
@@ -195,6 +197,126 @@ TEST_F(TagFileFormat, WhatLaterVersionsMayAddIsPassedOver)
     content[6] = 3;
     TagFile again;
     ASSERT_TRUE(read(again, content + "behind the end"));
+    EXPECT_EQ(treeText(again), treeText(file));
+}
+
+/// What the reader would refuse, or lose something of.
+struct Unreadable
+{
+    const char* reason;
+    void (*spoil)(TagFile& file);
+};
+
+TagMap* nestedItems(int depth)
+{
+    auto* item = new TagMap;
+    for (int i = 0; i < depth; ++i) {
+        auto* sequence = new TagSequence;
+        sequence->addItem(item);
+        item = new TagMap;
+        item->putElement(DCM_RequestAttributesSequence, sequence);
+    }
+    return item;
+}
+
+void nest(TagFile& file, int depth)
+{
+    const std::unique_ptr<TagMap> outermost(nestedItems(depth));
+    file.findImage("2")->putElement(DCM_RequestAttributesSequence,
+                                    outermost->findElement(DCM_RequestAttributesSequence)->clone());
+}
+
+void nameVolumes(TagFile& file, int images)
+{
+    TagMap& series = *file.findSeries("1.2.3");
+    for (int i = series.children().size(); i < images; ++i)
+        file.addTagMap(anImage(QByteArray::number(1000 + i).constData()).map(), nullptr, false);
+    QByteArray all;
+    for (int i = 0; i < 256; ++i)
+        all.append(static_cast<char>(i));
+    series.putAndInsertValue(DcmTagKey(0x0006, 0x7103), VrCode::OB, all);
+    series.addBareVolume(new Volume);
+}
+
+const Unreadable kUnreadable[] = {
+    {"Tag file would nest sequence items deeper than the format allows",
+     [](TagFile& file) { nest(file, kMaxItemDepth + 1); }},
+    {"Tag file would hold more nodes, items and values than the format allows",
+     [](TagFile& file) {
+         auto* sequence = new TagSequence;
+         for (int i = 0; i < kMaxElements; ++i)
+             sequence->addItem(nullptr);
+         file.study()->putElement(DCM_RequestAttributesSequence, sequence);
+     }},
+    {"Tag file would be larger than the format allows",
+     [](TagFile& file) {
+         const QByteArray half(static_cast<int>(kMaxBodySize / 2), 'x');
+         file.findImage("1")->putAndInsertValue(DCM_PixelData, VrCode::OB, half);
+         file.findImage("2")->putAndInsertValue(DCM_PixelData, VrCode::OB, half);
+     }},
+    {"Tag file would hold volumes of more images than the format allows",
+     [](TagFile& file) { nameVolumes(file, kMaxVolumeImages / 256 + 1); }},
+    {"Tag file would hold image 1 twice",
+     [](TagFile& file) { file.findImage("2")->putAndInsertString(DCM_SOPInstanceUID, "1"); }},
+    {"Tag file would hold image without UID twice",
+     [](TagFile& file) {
+         file.findImage("1")->deleteElement(DCM_SOPInstanceUID);
+         file.findImage("2")->deleteElement(DCM_SOPInstanceUID);
+     }},
+    {"Tag file would hold series 1.2.3 twice",
+     [](TagFile& file) {
+         TagFileTest::add(file, anImage("3").inSeries("1.2.4"));
+         file.findSeries("1.2.4")->putAndInsertString(DCM_SeriesInstanceUID, "1.2.3");
+     }},
+    {"Tag file of study 1.2 would hold study 9",
+     [](TagFile& file) { file.study()->putAndInsertString(DCM_StudyInstanceUID, "9"); }},
+};
+
+TEST_F(TagFileFormat, IsNotWrittenWithWhatItsReaderWouldRefuse)
+{
+    for (const Unreadable& row : kUnreadable) {
+        TagFile file;
+        add(file, anImage("1"));
+        ASSERT_TRUE(file.writeCacheFile());
+        const QByteArray before = content();
+        add(file, anImage("2"));
+        row.spoil(file);
+        const LogCapture log;
+        EXPECT_FALSE(file.writeCacheFile());
+        EXPECT_EQ(file.failure(), QLatin1String(row.reason));
+        QByteArray streamed;
+        QDataStream out(&streamed, QIODevice::WriteOnly);
+        EXPECT_FALSE(file.writeCacheFile(out));
+        EXPECT_EQ(log.count(row.reason), 2);
+        EXPECT_TRUE(streamed.isEmpty());
+        EXPECT_EQ(content(), before);
+    }
+}
+
+TEST_F(TagFileFormat, AMergeThatItsReaderWouldRefuseLeavesTheFile)
+{
+    TagFile held;
+    add(held, anImage("1"));
+    ASSERT_TRUE(held.writeCacheFile());
+    const QByteArray before = content();
+    TagFile fresh;
+    add(fresh, anImage("2"));
+    nest(fresh, kMaxItemDepth + 1);
+    const LogCapture log;
+    EXPECT_FALSE(fresh.mergeIntoCacheFile());
+    EXPECT_EQ(log.count(kUnreadable[0].reason), 1);
+    EXPECT_EQ(content(), before);
+}
+
+TEST_F(TagFileFormat, WhatItsReaderJustTakesIsWritten)
+{
+    TagFile file;
+    add(file, anImage("1"));
+    add(file, anImage("2"));
+    nest(file, kMaxItemDepth);
+    nameVolumes(file, kMaxVolumeImages / 256);
+    TagFile again;
+    ASSERT_TRUE(read(again, written(file)));
     EXPECT_EQ(treeText(again), treeText(file));
 }
 

@@ -2,6 +2,7 @@
 #include "kddlib/Limits.h"
 #include "kddlib/items/TextDecoding.h"
 #include "kddlib/items/TextEncoding.h"
+#include "kddlib/tagfile/QAEditor.h"
 
 #include <QDate>
 #include <QLocale>
@@ -55,6 +56,22 @@ TEST(QAJobXml, IsReadByTheNamesOfItsElements)
     EXPECT_FALSE(job.substitutions.at(2).value.isNull()) << "empty, but a value";
 }
 
+TEST(QAJobXml, TimeAndLoginMayBeIndentedAndTheTimeHaveAFraction)
+{
+    QAData job;
+    QString message;
+    ASSERT_TRUE(job.parse("<Job>\n <Timestamp>\n  20240131120000.25+0100\n </Timestamp>\n"
+                          " <Login>\n  anna b\n </Login>\n</Job>",
+                          message))
+        << message.toStdString();
+    EXPECT_EQ(job.timestamp, "\n  20240131120000.25+0100\n ") << "as it stands";
+    EXPECT_EQ(job.login, "anna b");
+    QString time;
+    EXPECT_TRUE(auditTime(job.timestamp, time));
+    EXPECT_EQ(time, QStringLiteral("31/1/2024 12:00:00 PM"));
+    EXPECT_TRUE(job.parse("<Timestamp> </Timestamp>", message)) << "now";
+}
+
 class QAJobFault : public testing::TestWithParam<Fault>
 {
 };
@@ -86,6 +103,7 @@ const Fault kJobFaults[] = {
      "(0010,0010) stands twice"},
     {"Timestamp", "<Timestamp>20240230120000</Timestamp>", "\"20240230120000\" is no time"},
     {"TimestampTooLong", "<Timestamp>202401311200001</Timestamp>", "is no time"},
+    {"TimestampInTwoParts", "<Timestamp>20240131 120000</Timestamp>", "is no time"},
     {"Login", "<Login>\xd0\x96</Login>", "Latin-1"},
     {"LoginOfTwoLines", "<Login>a\nb</Login>", "one line"},
     {"TwoOldStudies", "<a><Substitutions OldSUID='1'/><Substitutions OldSUID='2'/></a>",

@@ -88,6 +88,23 @@ TEST_F(TagFileTree, RemovingTheLastImageEmptiesIt)
     EXPECT_NE(add(file, anImage("1").inStudy("another")), nullptr);
 }
 
+TEST_F(TagFileTree, TakesUidsAndPathsThatAreItsOwn)
+{
+    TagFile file;
+    add(file, anImage("1"), "/store/1_a.dcm");
+    add(file, anImage("2"), "/store/2_a.dcm");
+    const char* path = file.findImage("2")->findElement(DcmTagKey(0x0006, 0x7101))->value().constData();
+    EXPECT_EQ(file.addTagMap(file.findImage("2"), nullptr, true), file.findImage("2")) << "held already";
+    EXPECT_NE(file.addTagMap(anImage("2").map(), path, true), nullptr);
+    const QByteArray& own = file.findImage("1")->findElement(DCM_SOPInstanceUID)->value();
+    const char* images[] = {own.constData(), own.constData()};
+    EXPECT_EQ(file.removeImages(2, images), 1);
+    const char* series[] = {file.findSeries("1.2.3")->findElement(DCM_SeriesInstanceUID)->value().constData(),
+                            file.seriesByUID().firstKey().constData()};
+    EXPECT_EQ(file.removeSeries(2, series), 1);
+    EXPECT_TRUE(file.isEmpty());
+}
+
 TEST_F(TagFileTree, RemovingASeriesTakesItsImagesOutOfTheIndex)
 {
     TagFile file;

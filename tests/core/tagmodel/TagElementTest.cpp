@@ -77,6 +77,8 @@ const Text kParsed[] = {
     {VrCode::UT, " as\\it is ", " as\\it is "},
     {VrCode::FL, hex("0000803f000020c1"), "1\\-10"},
     {VrCode::FD, hex("000000000000f03f00000000000000c0"), "\t1 \\ -2e0\n"},
+    {VrCode::FD, hex("000000000000fc3f"), "1.75"},
+    {VrCode::OF, hex("0000e03f"), "1.75"},
     {VrCode::SL, hex("ffffffffffffff7f"), "-1 2147483647"},
     {VrCode::SS, hex("ffff0080"), "-1\\\\-32768"},
     {VrCode::UL, hex("ffffffff"), "4294967295"},

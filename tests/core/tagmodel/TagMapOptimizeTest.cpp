@@ -139,6 +139,32 @@ TEST(Optimize, AGivenValueReplacesThoseOfEqualBytes)
     EXPECT_EQ(absent.held(), "- / X / ? -");
 }
 
+TEST(Optimize, AGivenValueMayBeThatOfAChildThatLosesIt)
+{
+    const Tree tree("-", "-", "XXX XXX Y XXX");
+    // Value and key of an entry that goes: both are used until the last child is done.
+    const TagMap::Tags& of = tree.image(0).tagsForLevel();
+    tree.series->storeOptionB(of.firstKey(), VrCode::LO, of.first()->value());
+    EXPECT_EQ(tree.held(), "- / XXX / - - Y -");
+    const Tree marked("X", "-", "? ? Y");
+    marked.series->storeOptionA(marked.image(0).tagsForLevel().firstKey());
+    EXPECT_EQ(marked.held(), "X / ? / - - Y");
+}
+
+TEST(Optimize, ASequenceEqualsNoValue)
+{
+    const Tree tree("-", "-", "- -");
+    for (TagMap* node : {tree.series, &tree.image(1)}) {
+        auto* sequence = new TagSequence;
+        sequence->addItem(new TagMap);
+        node->putElement(kKey, sequence);
+    }
+    tree.series->storeOptionB(kKey, VrCode::LO, {});
+    EXPECT_FALSE(tree.series->findElement(kKey)->isSequence());
+    for (int i = 0; i < 2; ++i)
+        EXPECT_TRUE(tree.image(i).findElement(kKey)->isSequence());
+}
+
 TEST(RemoveTagsNotNeededByClient, LeavesWhatClientsShow)
 {
     DatasetBuilder image = anItem();

@@ -1,5 +1,6 @@
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
+#include "support/DatasetBuilder.h"
 #include "support/TreeText.h"
 
 #include <dcmtk/config/osconfig.h>
@@ -109,6 +110,33 @@ TEST(PutAndInsertString, TakesTheRepresentationOfTheDictionaryForANewElement)
     map.putAndInsertString(DCM_PatientID, "8");
     EXPECT_EQ(ownText(map), "0010,0020 16 8\n0028,0010 24 0002\n0028,0011 24 0001\n"
                             "0029,1009 10 3.1\n0029,1109 40 \n");
+}
+
+TEST(PutAndInsert, LoseNoSequence)
+{
+    const std::unique_ptr<TagMap> map(
+        anImage().withItem(DCM_RequestAttributesSequence, anItem().with(DCM_PatientID, "1")).map());
+    const TagElement* held = map->findElement(DCM_RequestAttributesSequence);
+    map->putElement(privateKey(0x1010), held->clone());
+    const std::string shown = shownText(*map);
+    EXPECT_TRUE(map->putAndInsertString(DCM_RequestAttributesSequence, "text"));
+    EXPECT_FALSE(map->putAndInsertInt(DCM_RequestAttributesSequence, 1));
+    EXPECT_FALSE(map->putAndInsertValue(DCM_RequestAttributesSequence, VrCode::UN, held->value()));
+    EXPECT_FALSE(map->putAndInsertValue(privateKey(0x0010), "ABC", VrCode::SH, "in its place"));
+    EXPECT_EQ(shownText(*map), shown);
+}
+
+TEST(PutAndInsert, TakeWhatTheMapItselfHolds)
+{
+    TagMap map;
+    map.markAsMissing(DCM_PatientID)->value() = "hidden";
+    map.putAndInsertString(DCM_PatientID, map.tagsForLevel().first()->value());
+    EXPECT_EQ(ownText(map), "0010,0020 10 hidden\n");
+    map.putElement(DCM_PatientID, map.findElement(DCM_PatientID));
+    EXPECT_EQ(ownText(map), "0010,0020 10 hidden\n");
+    map.markAsMissing(privateKey(0x1109))->value() = "hidden";
+    map.putAndInsertString(privateKey(0x1109), "in no encoding");
+    EXPECT_EQ(map.findElement(privateKey(0x1109))->value(), "") << "what a marker hides stays hidden";
 }
 
 }  // namespace

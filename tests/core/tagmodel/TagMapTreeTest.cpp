@@ -78,7 +78,7 @@ using Removal = void (*)(TagMap& series, TagMap& image);
 const Removal kRemovals[] = {
     [](TagMap& series, TagMap&) { series.deleteElement(kSequence); },
     [](TagMap& series, TagMap&) { series.markAsMissing(kSequence); },
-    [](TagMap& series, TagMap&) { series.putAndInsertValue(kSequence, VrCode::UN, "x"); },
+    [](TagMap& series, TagMap&) { series.putElement(kSequence, new TagElement(VrCode::UN, "x")); },
     [](TagMap& series, TagMap&) { static_cast<TagSequence*>(series.findElement(kSequence))->truncate(0); },
     [](TagMap& series, TagMap&) { series.putElement(kSequence, series.findElement(kSequence)->clone()); },
     [](TagMap&, TagMap& image) { image.detachItems(); },
@@ -102,6 +102,129 @@ TEST_F(TreeTest, AnItemTakesOverWhatItInheritsWhenTheOneAboveGoes)
         EXPECT_EQ(item(*image, 0)->parent(), item(*series, 0));
         EXPECT_EQ(shownText(*image), alone);
     }
+}
+
+/// Sequences made by hand, without a dataset.
+class HandMade : public TreeTest
+{
+protected:
+    static TagMap* mapOf(const char* procedure)
+    {
+        auto* map = new TagMap;
+        map->putAndInsertString(DCM_RequestedProcedureID, procedure);
+        return map;
+    }
+
+    static TagSequence* sequenceIn(TagMap& node)
+    {
+        auto* sequence = new TagSequence;
+        node.putElement(kSequence, sequence);
+        return sequence;
+    }
+
+    TagMap* attachWithItem(const char* sopUID, const char* procedure)
+    {
+        TagMap* map = anImage(sopUID).map();
+        sequenceIn(*map)->addItem(mapOf(procedure));
+        series->addChildMap(map, TagMap::ImageLevel);
+        return map;
+    }
+};
+
+TEST_F(HandMade, ItemsKeepWhatTheyHoldWhenTheirImagesAreAttached)
+{
+    const TagMap* one = attachWithItem("1", "A");
+    const TagMap* two = attachWithItem("2", "B");
+    const TagMap* three = attachWithItem("3", "C");
+    EXPECT_TRUE(item(*two, 0)->isSequenceItem());
+    EXPECT_EQ(ownText(*item(*one, 0)), "0040,1001 16 A\n");
+    EXPECT_EQ(ownText(*item(*two, 0)), "0040,1001 16 B\n");
+    EXPECT_EQ(ownText(*item(*three, 0)), "0040,1001 16 C\n");
+    EXPECT_EQ(item(*three, 0)->parent(), item(*one, 0));
+}
+
+TEST_F(HandMade, AnItemBelongsToOneSequence)
+{
+    TagMap* item = mapOf("A");
+    auto* image = new TagMap;
+    series->addChildMap(image, TagMap::ImageLevel);
+    series->putAndInsertString(DCM_PatientID, "7");
+    TagSequence& first = *sequenceIn(*series);
+    TagSequence second;
+    for (TagSequence* sequence : {&first, &second, &second})
+        sequence->addItem(item);
+    second.addItem(image);
+    second.addItem(nullptr);
+    EXPECT_EQ(first.item(0), item);
+    EXPECT_NE(second.item(0), second.item(1));
+    EXPECT_EQ(shownText(*second.item(1)), shownText(*item));
+    EXPECT_TRUE(series->children().isEmpty());
+    EXPECT_NE(second.item(2)->findElement(DCM_PatientID), nullptr) << "which it inherited";
+    EXPECT_FALSE(second.compare(second, false, nullptr)) << "because of the item that is not there";
+    const std::unique_ptr<DcmElement> made(second.createDcmElement(kSequence));
+    EXPECT_EQ(static_cast<DcmSequenceOfItems&>(*made).card(), 4U);
+}
+
+TEST_F(HandMade, ACopyOfASequenceOwnsOnlyWhatIsAddedToIt)
+{
+    TagSequence source;
+    source.addItem(mapOf("A"));
+    source.addItem(mapOf("B"));
+    {
+        TagSequence copy(source);
+        copy.addItem(mapOf("C"));
+        copy.truncate(1);
+        copy.addItem(mapOf("D"));
+        source = TagSequence(source);
+        copy = source;
+        source = copy;
+        copy.clear();
+        EXPECT_EQ(copy.numItems(), 0);
+    }
+    EXPECT_EQ(ownText(*source.item(1)), "0040,1001 16 B\n");
+}
+
+TEST_F(HandMade, ASequenceThatIsSetAgainStaysTheSameElement)
+{
+    DatasetBuilder image = anImageWithItems("1", "A");
+    DcmSequenceOfItems* source = nullptr;
+    ASSERT_TRUE(image.dataset().findAndGetSequence(kSequence, source).good());
+    TagMap map;
+    TagSequence* held = sequenceIn(map);
+    held->addItem(mapOf("old"));
+    EXPECT_EQ(map.setSequence(source, 1024), held);
+    EXPECT_EQ(held->numItems(), 2);
+    const std::unique_ptr<TagMap> whole(image.map());
+    EXPECT_TRUE(held->compare(*whole->findElement(kSequence), true, nullptr));
+}
+
+TEST_F(HandMade, ANodeThatIsAttachedAgainHangsOnceWithAllItShows)
+{
+    TagMap* image = attach(anImage("1").with(DCM_PatientID, "7"));
+    attach(anImage("2"));
+    const std::string shown = shownText(*image);
+    series->addChildMap(image, TagMap::ImageLevel);
+    EXPECT_EQ(series->children().size(), 2);
+    auto* other = new TagMap;
+    other->addChildMap(image, TagMap::ImageLevel);
+    EXPECT_EQ(series->children().size(), 1);
+    EXPECT_EQ(shownText(*image), shown);
+    EXPECT_TRUE(other->removeChildMap(image));
+    EXPECT_EQ(image->parent(), other);
+    delete other;
+    delete image;
+}
+
+TEST_F(HandMade, ACopyOfANodeThatIsAssignedBackChangesNothing)
+{
+    attach(anImage("1"));
+    const std::string shown = shownText(*series);
+    {
+        const TagMap copy(*series);
+        *series = copy;
+    }
+    EXPECT_EQ(shownText(*series), shown);
+    EXPECT_EQ(series->parent(), &study);
 }
 
 }  // namespace

@@ -86,12 +86,12 @@ public:
     }
 
     /// One for each series.
-    std::vector<StackPlan> plans() const
+    std::vector<StackPlan> plans(FrameOfReference reference = FrameOfReference::Shared) const
     {
         std::vector<StackPlan> plans;
         for (const TagFile& study : mStudies) {
             for (const TagMap* series : study.seriesByUID())
-                plans.push_back(planStacks(*series));
+                plans.push_back(planStacks(*series, reference));
         }
         return plans;
     }

@@ -144,6 +144,19 @@ TEST(StackPlanner, SaysWhyAnImageIsLeftOut)
     }
 }
 
+TEST(StackPlanner, SlicesOfDifferentFramesOfReferenceAreStackedOnRequest)
+{
+    Images images = atZ({0, 1, 2, 3, 4, 5});
+    for (std::size_t i = 0; i < 6; ++i)
+        images[i].with(DCM_FrameOfReferenceUID, i < 3 ? "1.9" : i < 4 ? "1.8" : "1.7");
+    const StackSeries series(images);
+    const StackPlan plan = series.plans().front();
+    EXPECT_EQ(planText(plan), "every 1: 1 2 3; without 4; without 5; without 6; ");
+    for (const LeftOutFrame& left : plan.leftOut)
+        EXPECT_THAT(left.reason.toStdString(), testing::HasSubstr("Frame of Reference"));
+    EXPECT_EQ(planText(series.plans(FrameOfReference::Ignored).front()), "every 1: 1 2 3 4 5 6; ");
+}
+
 /// Stacks by size and orientation, and images left out.
 using Counts = std::map<std::string, int>;
 

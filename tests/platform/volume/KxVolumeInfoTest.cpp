@@ -74,6 +74,13 @@ const RangeCase kRanges[] = {
     {"WithoutPaddingRange",
      signedRamp().numbers(DCM_PixelPaddingValue, {0xf830}).numbers(DCM_PixelPaddingRangeLimit, {0xff9c}), 0,
      1000},
+    {"OfOneValueBesidesPadding", ramp().words({0, 0, 255, 255}).numbers(DCM_PixelPaddingValue, {0}), 0, 255},
+    {"OfTheLogarithm",
+     ramp()
+         .with(DCM_Modality, "XA")
+         .with(DCM_PixelIntensityRelationship, "LOG")
+         .withItem(DCM_ModalityLUTSequence, lookUp({3, 99, 16}, {7, 500, 900})),
+     0, 2000},
     {"OfTheModalityTable", ramp().withItem(DCM_ModalityLUTSequence, lookUp({3, 99, 16}, {7, 500, 900})), 7,
      900},
     {"OfTheVoiTable", ramp().withItem(DCM_VOILUTSequence, lookUp({2, 99, 16}, {10, 4000})), 10, 4000},

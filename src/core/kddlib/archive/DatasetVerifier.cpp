@@ -118,7 +118,8 @@ private:
         int i = 0;
         for (DcmObject* item = sequence.nextInContainer(nullptr); item != nullptr;
              item = sequence.nextInContainer(item), ++i)
-            verify(static_cast<DcmItem&>(*item), *items->item(i), path + '[' + QByteArray::number(i) + "].");
+            verify(static_cast<DcmItem&>(*item), items->itemToRead(i),
+                   path + '[' + QByteArray::number(i) + "].");
     }
 
     void element(DcmElement& element, const TagElement& held, const QByteArray& prefix)

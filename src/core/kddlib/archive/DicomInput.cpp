@@ -1,6 +1,7 @@
 #include "kddlib/archive/DicomInput.h"
 
 #include "kddlib/Limits.h"
+#include "kddlib/net/DamagedFile.h"
 #include "kddlib/net/DicomFileReader.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/VolumeInfo.h"
@@ -143,7 +144,7 @@ DicomInput::DicomInput(DicomInput&&) noexcept = default;
 DicomInput& DicomInput::operator=(DicomInput&&) noexcept = default;
 DicomInput::~DicomInput() = default;
 
-DicomInput readDicomInput(const QByteArray& path)
+DicomInput readDicomInput(const QByteArray& path, Damage damage)
 {
     DicomInput input;
     input.path = path;
@@ -162,7 +163,9 @@ DicomInput readDicomInput(const QByteArray& path)
         return std::move(takeVolume(input));
     const bool isDicom = hasDicomPrefix(file);
     DcmFileFormat format;
-    const OFCondition condition = readDicomFile(path.constData(), format);
+    const OFCondition condition = damage == Damage::Refused
+                                      ? readDicomFile(path.constData(), format)
+                                      : readDamagedDicomFile(path.constData(), format, input.leftOut);
     if (condition.bad() || (!isDicom && !namesItself(*format.getDataset())))
         return std::move(refuse(input, isDicom ? DicomInput::Kind::Unusable : DicomInput::Kind::Other,
                                 condition.bad() ? QString::fromLatin1(condition.text())

@@ -37,6 +37,7 @@ struct KDD_EXPORT DicomInput
     std::unique_ptr<TagMap> map;  ///< of an image, parentless
     QByteArray studyUID;
     QByteArray seriesUID;
+    QString leftOut;  ///< of an image that is damaged: what it lacks
     qint64 fileBytes = 0;
     qint64 headerBytes = 0;  ///< the file without its pixel data
 
@@ -46,9 +47,12 @@ struct KDD_EXPORT DicomInput
     ~DicomInput();
 };
 
+/// What to do with damaged DICOM files: refuse them, or take what is sound (`readDamagedDicomFile`).
+enum class Damage { Refused, Tolerated };
+
 /// Reads one file: of an image its attributes, of a volume file its header. Media directories (DICOMDIR) count as not
 /// DICOM: they describe files, not patients. An object that names no study or series is unusable. May be called on
 /// several threads at once.
-KDD_EXPORT DicomInput readDicomInput(const QByteArray& path);
+KDD_EXPORT DicomInput readDicomInput(const QByteArray& path, Damage damage);
 
 }  // namespace Kdd

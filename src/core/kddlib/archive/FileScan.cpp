@@ -21,12 +21,12 @@ namespace
 /// Files read ahead of the one being handed on, so that reading uses every core.
 constexpr int kFilesPerTask = 16;
 
-std::vector<DicomInput> readSome(const QList<QByteArray>& paths)
+std::vector<DicomInput> readSome(const QList<QByteArray>& paths, Damage damage)
 {
     std::vector<DicomInput> inputs;
     inputs.reserve(static_cast<std::size_t>(paths.size()));
     for (const QByteArray& path : paths)
-        inputs.push_back(readDicomInput(path));
+        inputs.push_back(readDicomInput(path, damage));
     return inputs;
 }
 
@@ -47,7 +47,8 @@ bool FileScan::readAll(const QList<QByteArray>& files, const std::function<bool(
     qint64 done = 0;
     while (next < files.size() || !running.empty()) {
         while (next < files.size() && running.size() <= ahead) {
-            running.push_back(std::async(std::launch::async, readSome, files.mid(next, kFilesPerTask)));
+            running.push_back(
+                std::async(std::launch::async, readSome, files.mid(next, kFilesPerTask), mDamage));
             next += kFilesPerTask;
         }
         for (DicomInput& input : running.front().get()) {
@@ -100,6 +101,10 @@ bool FileScan::handOn(DicomInput input, const std::function<bool(DicomInput)>& t
 {
     switch (input.kind) {
     case DicomInput::Kind::Image:
+        if (!input.leftOut.isEmpty())
+            LogFile::warnf("%s is damaged: left out %s", input.path.constData(),
+                           qUtf8Printable(input.leftOut));
+        break;
     case DicomInput::Kind::Volume:
         break;
     case DicomInput::Kind::Other:

@@ -27,6 +27,9 @@ public:
     /// Folders and files that the archive keeps itself, absolute.
     void setOwnPlaces(const QList<QByteArray>& places) { mOwnPlaces = places; }
 
+    /// Of damaged files what is sound is taken, with a warning that tells what is left out; else they are refused.
+    void setDamage(Damage damage) { mDamage = damage; }
+
     /// Files that are no images are named in the log.
     void setNamesSkipped(bool names) { mNamesSkipped = names; }
 
@@ -49,6 +52,7 @@ private:
     WorkObserver& mObserver;
     QList<QByteArray> mOwnPlaces;
     bool mNamesSkipped = false;
+    Damage mDamage = Damage::Refused;
     int mUnchanged = 0;
     int mSkipped = 0;
     std::vector<RefusedFile> mRefused;

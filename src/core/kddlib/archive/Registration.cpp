@@ -42,6 +42,7 @@ bool Registration::add(const DicomInput& input)
     switch (input.kind) {
     case DicomInput::Kind::Image:
         mBatch.dicom.push_back(fileRecord(*input.map, input.path, input.stamp));
+        mBatch.dicom.back().isDamaged = !input.leftOut.isEmpty();
         break;
     case DicomInput::Kind::Volume:
         mBatch.volumes.push_back({input.path, input.stamp, input.studyUID, input.seriesUID});

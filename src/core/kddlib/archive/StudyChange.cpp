@@ -75,7 +75,7 @@ bool removeUnregistered(const ArchiveNode& node)
     TagFile file;
     if (!QFileInfo::exists(TagFile::cacheFilePathForStudy(node.study.constData())))
         return failAbsent(node);
-    if (!file.readCacheFileForStudy(node.study.constData(), true))
+    if (!file.readWhenFreeForStudy(node.study.constData(), true))
         return failChanging(node.study, file);
     if (!isHeld(node, file))
         return failAbsent(node);
@@ -103,7 +103,7 @@ bool StudyChange::removeRegistered(const ArchiveNode& node)
     TagFile present;
     const bool isWholeStudy = node.series.isEmpty() && node.image.isEmpty();
     if (!isWholeStudy && !isListed(node, contents) &&
-        !(present.readCacheFileForStudy(node.study.constData(), false) && isHeld(node, present)))
+        !(present.readWhenFreeForStudy(node.study.constData(), false) && isHeld(node, present)))
         return failAbsent(node);
     return forget(node) && StudyCompletion(mCatalogue).reduce(*claim).isDone;
 }

@@ -3,7 +3,7 @@
 #include "kddlib/archive/ArchiveDatabase.h"
 #include "kddlib/archive/DatasetVerifier.h"
 #include "kddlib/archive/WorkObserver.h"
-#include "kddlib/net/DicomFileReader.h"
+#include "kddlib/net/KxDcmFileLoader.h"
 #include "kddlib/tagfile/StudyRecord.h"
 #include "kddlib/tagfile/TagFile.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
@@ -126,7 +126,7 @@ void StudyCheck::check(const QByteArray& studyUID)
 
 bool StudyCheck::read(const QByteArray& studyUID, TagFile& file)
 {
-    if (file.readCacheFileForStudy(studyUID.constData(), false))
+    if (file.readWhenFreeForStudy(studyUID.constData(), false))
         return true;
     // One that waits to be built for the first time has none yet, which was told.
     const QString path = TagFile::cacheFilePathForStudy(studyUID.constData());
@@ -205,7 +205,7 @@ void StudyCheck::checkImage(const QByteArray& key, const TagMap& image)
 {
     const QByteArray path = filePathOf(image);
     DcmFileFormat dicom;
-    const OFCondition condition = readDicomFile(path.constData(), dicom);
+    const OFCondition condition = loadDicomFile(path.constData(), dicom);
     if (condition.bad()) {
         ++mFindings.unreadable;
         mReport(

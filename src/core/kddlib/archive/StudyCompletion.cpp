@@ -70,7 +70,7 @@ CompletedStudy StudyCompletion::reduce(Kxg::StudyClaim& claim)
         return remove(claim);
     TagFile present;
     const QByteArray& studyUID = claim.studyInstanceUID();
-    if (!isTrusted(studyUID) || !present.readCacheFileForStudy(studyUID.constData(), true) ||
+    if (!isTrusted(studyUID) || !present.readWhenFreeForStudy(studyUID.constData(), true) ||
         !holdsListed(TagFile(), present)) {
         present.close();
         return build(claim, TagFile());
@@ -140,7 +140,7 @@ bool StudyCompletion::isTrusted(const QByteArray& studyUID) const
 bool StudyCompletion::canMerge(const QByteArray& studyUID, const TagFile& arrivals, TagFile& present) const
 {
     return arrivals.studyInstanceUID() == studyUID && isTrusted(studyUID) &&
-           present.readCacheFileForStudy(studyUID.constData(), false) && holdsListed(arrivals, present) &&
+           present.readWhenFreeForStudy(studyUID.constData(), false) && holdsListed(arrivals, present) &&
            std::all_of(arrivals.imagesByUID().keyBegin(), arrivals.imagesByUID().keyEnd(),
                        [&](const QByteArray& key) { return mListed.contains(key); }) &&
            unlisted(present).empty();

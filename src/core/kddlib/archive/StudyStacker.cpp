@@ -5,7 +5,6 @@
 #include "kddlib/tagfile/TagFile.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
-#include "kddlib/volumes/StackPlanner.h"
 #include "kddlib/volumes/StackWriter.h"
 #include "platform/base/LogFile.h"
 #include "platform/os/FileStatus.h"
@@ -56,7 +55,7 @@ bool StudyStacker::run()
 {
     removeUnfinished();
     TagFile file;
-    if (!file.readCacheFileForStudy(mStudyUID.constData(), false)) {
+    if (!file.readWhenFreeForStudy(mStudyUID.constData(), false)) {
         LogFile::errorf("Study %s cannot be stacked: %s", mStudyUID.constData(),
                         qUtf8Printable(file.failure()));
         return false;
@@ -90,7 +89,7 @@ bool StudyStacker::stackSeries(const QByteArray& seriesUID, const TagMap& series
         return false;
     if (told.hadVolumes)
         return true;
-    const StackPlan plan = planStacks(series);
+    const StackPlan plan = planStacks(series, mOptions.reference);
     for (const LeftOutFrame& leftOut : plan.leftOut)
         ++told.reasons[leftOut.reason];
     bool isDone = true;

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "kddlib/volumes/StackPlanner.h"
 #include "platform/base/Export.h"
 #include "platform/database/Catalogue.h"
 
@@ -12,7 +13,6 @@ namespace Kdd
 {
 
 class TagMap;
-struct Stack;
 
 /// What is told of one series.
 struct StackedSeries
@@ -29,6 +29,7 @@ struct StackOptions
     QString
         folder;  ///< of all volume files; those of a study lie in folders below, as the tag files do in theirs
     bool again = false;  ///< also series that have volume files already
+    FrameOfReference reference = FrameOfReference::Shared;
 };
 
 /// Makes volume files from the series of a study that can be stacked, registers them and completes the study.

@@ -1,14 +1,16 @@
 #include "kddlib/capi/Border.h"
 
+#include "kddlib/net/CurlError.h"
 #include "platform/base/LogFile.h"
 
 namespace Kdd
 {
 
-void logFault(const char* function, const char* reason) noexcept
+void logFault(const char* function, const std::exception* fault) noexcept
 {
     try {
-        LogFile::errorf("%s: %s", function, reason);
+        const std::string reason = fault != nullptr ? textForLog(*fault) : "unknown fault";
+        LogFile::write(LogFile::Severity::Error, std::string(function) + ": " + reason);
     } catch (...) {
         // Without memory even for a line there is nobody left to tell; the caller has the result.
         return;

@@ -7,8 +7,8 @@ namespace Kdd
 
 // What every C function needs at the border to its caller.
 
-/// Logs why a call was given up. Never throws itself, whatever state the process is in.
-void logFault(const char* function, const char* reason) noexcept;
+/// Logs why a call was given up; null: nobody knows. Never throws itself, whatever state the process is in.
+void logFault(const char* function, const std::exception* fault) noexcept;
 
 /// Runs the body of a C function with that function's name, for the log. What it throws ends here, in the log, and
 /// `onFault` is the result: an exception must not run into frames of another language.
@@ -18,9 +18,9 @@ Value guarded(const char* function, Value onFault, const Body& body) noexcept
     try {
         return body(function);
     } catch (const std::exception& fault) {
-        logFault(function, fault.what());
+        logFault(function, &fault);
     } catch (...) {
-        logFault(function, "unknown fault");
+        logFault(function, nullptr);
     }
     return onFault;
 }

@@ -27,6 +27,7 @@ void configureLogging(int flags, const char* databaseServer)
     const bool isDebug = (flags & kDebugFlag) != 0;
     const bool hasTimings = (flags & kTimingsFlag) != 0;
     LogFile::setLevel(LogFile::Level::Everything);
+    LogFile::setDebugLogging(isDebug);
     LogFile::setCallback(isDebug ? LogFile::Callback() : LogFile::Callback(writeToSystemLog));
     TagFile::setDebugOptions(hasTimings ? TagFile::kTimings : 0);
     if (isDebug)

@@ -42,10 +42,21 @@ void removeStaleEntries(const QList<QByteArray>& names)
     }
 }
 
-bool applyJob(const char* jobXml, QAData& job)
+bool parse(const QByteArray& xml, QAData& job, QString& message)
+{
+    return job.parse(xml, message);
+}
+
+bool parse(const QString& xml, QAData& job, QString& message)
+{
+    return job.parseText(xml, message);
+}
+
+template <typename Xml>
+bool applyJob(const Xml& jobXml, QAData& job)
 {
     QString message;
-    if (!job.parse(jobXml, message))
+    if (!parse(jobXml, job, message))
         return fail("Error reading UPQ job XML", message);
     if (!TagFile::applyQA(job, message))
         return fail("Error updating tag file", message);
@@ -86,34 +97,42 @@ private:
     std::vector<const char*> mPointers;
 };
 
+/// What both functions do once the XML is a pointer no more.
+template <typename Xml>
+bool update(const char* function, const Xml& jobXml, const char* studyUID, int count, const char** images,
+            const char** cacheEntries)
+{
+    if (!isGiven(function, "the study UID", studyUID) || !areGiven(function, "an image UID", count, images) ||
+        (cacheEntries != nullptr && !areGiven(function, "a cache entry", count, cacheEntries)))
+        return false;
+    QAData job;
+    job.studyUID = studyUID;
+    job.images = listOf(count, images);
+    if (cacheEntries != nullptr)
+        job.cacheEntries = listOf(count, cacheEntries);
+    return applyJob(jobXml, job);
+}
+
 }  // namespace
 
 bool UpdateTagFile(const char* jobXml, const char* studyUID, int count, const char** images,
                    const char** cacheEntries)
 {
     return guarded(__func__, false, [&](const char* function) {
-        if (!isGiven(function, "the job", jobXml) || !isGiven(function, "the study UID", studyUID) ||
-            !areGiven(function, "an image UID", count, images) ||
-            (cacheEntries != nullptr && !areGiven(function, "a cache entry", count, cacheEntries)))
-            return false;
-        QAData job;
-        job.studyUID = studyUID;
-        job.images = listOf(count, images);
-        if (cacheEntries != nullptr)
-            job.cacheEntries = listOf(count, cacheEntries);
-        return applyJob(jobXml, job);
+        return isGiven(function, "the job", jobXml) &&
+               update(function, QByteArray(jobXml), studyUID, count, images, cacheEntries);
     });
 }
 
 bool UpdateTagFileW(const wchar_t* jobXml, const wchar_t* studyUID, int count, const wchar_t** images,
                     const wchar_t** cacheEntries)
 {
-    return guarded(__func__, false, [&](const char* /*function*/) {
-        const QByteArray job = narrow(jobXml);
+    return guarded(__func__, false, [&](const char* function) {
         const QByteArray study = narrow(studyUID);
         NarrowTexts narrowImages(count, images);
         NarrowTexts narrowEntries(count, cacheEntries);
-        return UpdateTagFile(pointerTo(job), pointerTo(study), count, narrowImages.array(),
-                             narrowEntries.array());
+        return isGiven(function, "the job", jobXml) &&
+               update(function, QString::fromWCharArray(jobXml), pointerTo(study), count,
+                      narrowImages.array(), narrowEntries.array());
     });
 }

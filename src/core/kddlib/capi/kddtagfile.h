@@ -17,7 +17,9 @@ extern "C" {
 ///
 /// Each call stands for itself; nothing but the settings of `ConfigureLogging` is kept between calls. Every function
 /// but that one may be called on any thread and by several at once, also for one and the same study and from several
-/// processes: who changes a tag file holds it alone meanwhile, and the others wait, up to about two seconds.
+/// processes: who changes a tag file holds it alone meanwhile, and the others wait. They try for 0.4 seconds and then
+/// fail, but for `DeleteTagFile`, which gives up after 50 ms, and `ReadAndSyncTagFileData`, which goes on for as long as
+/// the site's settings say, 2 seconds without them.
 ///
 /// Texts end with a zero byte, are UTF-8 and stay the caller's. A pointer that must not be null but is, or a negative
 /// count, makes a call do nothing but log and report failure. No C++ exception leaves a function; it is a failure,
@@ -30,8 +32,8 @@ extern "C" {
 /// image database, "sqlite:FILE" or "postgresql://[USER[:PASSWORD]@]HOST[:PORT]/DATABASE"; null leaves it as it is.
 ///
 /// From then on everything is logged. Bit 0 of `flags`, debug: lines go to standard error and, when the environment
-/// variable KDD_LOG_FILE names one, to a file. Without it they go to the system's log (syslog). Bit 1, timings: also
-/// how long corrections took.
+/// variable KDD_LOG_FILE names one, to a file, and they tell how long tag files took to read and to write, and of each
+/// that is not there. Without it they go to the system's log (syslog). Bit 1, timings: also how long corrections took.
 KDD_EXPORT void ConfigureLogging(short flags, const char* databaseServer);
 
 /// Removes images from a study's tag file by their SOP Instance UIDs. UIDs that it does not hold are passed over;
@@ -58,7 +60,7 @@ KDD_EXPORT bool DeleteTagFile(const char* studyUID);
 KDD_EXPORT bool UpdateTagFile(const char* jobXml, const char* studyUID, int count, const char** images,
                               const char** cacheEntries);
 
-/// The same with wide texts.
+/// The same with wide texts. Whatever encoding the XML declares, its text is the text that is given.
 KDD_EXPORT bool UpdateTagFileW(const wchar_t* jobXml, const wchar_t* studyUID, int count,
                                const wchar_t** images, const wchar_t** cacheEntries);
 

@@ -116,7 +116,7 @@ private:
         for (DcmObject* item = sequence.nextInContainer(nullptr); item != nullptr;
              item = sequence.nextInContainer(item), ++i) {
             mOut << (i == 0 ? ",\"Value\":[" : ",");
-            object(static_cast<DcmItem&>(*item), *source.item(i), address + '/' + std::to_string(i));
+            object(static_cast<DcmItem&>(*item), source.itemToRead(i), address + '/' + std::to_string(i));
         }
         mOut << (i > 0 ? "]}" : "}");
     }

@@ -268,7 +268,7 @@ unsigned int SequenceOfItemsTM::card()
 
 Item* SequenceOfItemsTM::getItem(unsigned int index)
 {
-    if (index >= card())
+    if (index >= card() || mSequence->item(static_cast<int>(index)) == nullptr)
         return nullptr;
     if (mItems.size() <= index)
         mItems.resize(index + 1U);

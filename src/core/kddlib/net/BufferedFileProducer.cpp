@@ -13,6 +13,9 @@ namespace
 /// Most headers fit into it whole.
 constexpr qint64 kWindow = 16 * 1024;
 
+makeOFConditionConst(EC_FileChanged, OFM_dcmdata, 0x301, OF_error,
+                     "The file has changed since it was opened");
+
 }  // namespace
 
 BufferedFileProducer::BufferedFileProducer(const char* path)
@@ -22,16 +25,32 @@ BufferedFileProducer::BufferedFileProducer(const char* path)
         mStatus = makeOFCondition(OFM_dcmdata, 18, OF_error, std::strerror(error));
 }
 
+BufferedFileProducer::BufferedFileProducer(const char* path, qint64 offset, const FileIdentity& identity)
+    : BufferedFileProducer(path)
+{
+    mMustNotChange = true;
+    mPosition = offset;
+    if (good() && !(mFile.identity() == identity))
+        mStatus = EC_FileChanged;
+}
+
+/// Reads at the position; at most 0 when nothing is to be had, or may be.
+qint64 BufferedFileProducer::readFile(void* bytes, qint64 count)
+{
+    const qint64 got = mFile.readAt(mPosition, bytes, count);
+    if (got <= 0)
+        mStatus = EC_InvalidStream;
+    else if (mMustNotChange && !mFile.isUnchanged())
+        mStatus = EC_FileChanged;
+    return good() ? got : 0;
+}
+
 /// Moves the window so that it begins at the position.
 bool BufferedFileProducer::fillWindow()
 {
     mWindowStart = mPosition;
-    mWindowSize = mFile.readAt(mPosition, mWindow.get(), kWindow);
-    if (mWindowSize > 0)
-        return true;
-    mWindowSize = 0;
-    mStatus = EC_InvalidStream;
-    return false;
+    mWindowSize = readFile(mWindow.get(), kWindow);
+    return mWindowSize > 0;
 }
 
 offile_off_t BufferedFileProducer::read(void* bytes, offile_off_t count)
@@ -41,11 +60,16 @@ offile_off_t BufferedFileProducer::read(void* bytes, offile_off_t count)
     const qint64 wanted = left;
     while (left > 0) {
         const bool isInWindow = mPosition >= mWindowStart && mPosition < mWindowStart + mWindowSize;
-        if (!isInWindow && !fillWindow())
+        qint64 part = 0;
+        if (!isInWindow && left >= kWindow) {
+            part = readFile(to, left);
+        } else if (isInWindow || fillWindow()) {
+            const qint64 offset = mPosition - mWindowStart;
+            part = qMin(left, mWindowSize - offset);
+            std::memcpy(to, mWindow.get() + offset, static_cast<std::size_t>(part));
+        }
+        if (part <= 0)
             break;
-        const qint64 offset = mPosition - mWindowStart;
-        const qint64 part = qMin(left, mWindowSize - offset);
-        std::memcpy(to, mWindow.get() + offset, static_cast<std::size_t>(part));
         to += part;
         mPosition += part;
         left -= part;

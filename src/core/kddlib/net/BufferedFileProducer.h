@@ -22,6 +22,12 @@ public:
     /// Opens the file; `status` tells when that fails.
     explicit BufferedFileProducer(const char* path);
 
+    /// The same from byte `offset` (0-based) on, as long as the file is the one of `identity`; from the first read on
+    /// that finds another, `status` says so.
+    BufferedFileProducer(const char* path, qint64 offset, const FileIdentity& identity);
+
+    const FileIdentity& identity() const { return mFile.identity(); }
+
     OFBool good() const override { return mStatus.good(); }
     OFCondition status() const override { return mStatus; }
     OFBool eos() override { return mPosition >= mFile.size(); }
@@ -33,9 +39,11 @@ public:
     void putback(offile_off_t count) override;
 
 private:
+    qint64 readFile(void* bytes, qint64 count);
     bool fillWindow();
 
     RandomAccessFile mFile;
+    bool mMustNotChange = false;
     OFCondition mStatus;
     std::unique_ptr<char[]> mWindow;
     qint64 mWindowStart = 0;

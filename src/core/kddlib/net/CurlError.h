@@ -19,11 +19,14 @@ public:
     /// when there is one; and, when the two sides have no cipher in common, a line with the cure.
     const char* what() const noexcept override { return mMessage.c_str(); }
 
-    /// That line on its own; empty for other codes.
+    /// That last line; empty for other codes.
     static std::string cureFor(int code);
 
 private:
     std::string mMessage;
 };
+
+/// An error's text as `LogFile::write` takes it: the line ends are those of a CurlError, all else is escaped.
+std::string textForLog(const std::exception& error);
 
 }  // namespace Kdd

@@ -40,7 +40,12 @@ void CurlOptions::setTransport(const std::string& url, const CurlShare& share,
 {
     set(CURLOPT_SHARE, share.handle());
     setVerification();
+    // Curl would take what comes before it for the whole.
+    if (url.find('\0') != std::string::npos)
+        throw CurlError(CURLE_URL_MALFORMAT, "The address has a zero byte in it");
     set(CURLOPT_URL, url.c_str());
+    // The server is asked for what the address says: with "." and ".." resolved that might be another object.
+    set(CURLOPT_PATH_AS_IS, 1L);
     // An address comes from outside and must not lead to local files or to other services.
     set(CURLOPT_PROTOCOLS_STR, "http,https");
     set(CURLOPT_NOSIGNAL, 1L);

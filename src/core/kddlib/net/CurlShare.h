@@ -8,15 +8,15 @@
 namespace Kdd
 {
 
-/// What all requests of a client have in common: DNS answers, TLS sessions and open connections, so that a request
-/// need not begin with finding the server and shaking hands.
+/// What all requests of a client have in common: DNS answers and TLS sessions, so that a request need not begin with
+/// finding the server and a full handshake; on request open connections as well.
 ///
 /// Any number of threads may run requests on it. It must outlive the requests.
 class CurlShare
 {
 public:
-    /// PerHandle: curl documents sharing connections between threads as experimental; without it each pooled handle
-    /// keeps connections of its own.
+    /// PerHandle: each pooled handle keeps connections of its own. Shared: curl documents that as unsupported between
+    /// threads, and many of them with many servers end the process within seconds.
     enum class Connections { Shared, PerHandle };
 
     /// std::runtime_error when curl refuses.

@@ -1,6 +1,7 @@
 #pragma once
 
 #include "kddlib/net/DownloadProducer.h"
+#include "platform/base/Export.h"
 
 #include <dcmtk/config/osconfig.h>
 
@@ -10,7 +11,7 @@ namespace Kdd
 {
 
 /// A download as the source of DCMTK's parser.
-class DcmCurlProducer : public DownloadProducer
+class KDD_EXPORT DcmCurlProducer : public DownloadProducer
 {
 public:
     using DownloadProducer::DownloadProducer;
@@ -18,7 +19,7 @@ public:
 
 /// A download as DCMTK's parser reads it. Values cannot be left where they are to be read later: the parser has to be
 /// told to read all of them.
-class DcmInputCurlStream : public DcmInputStream
+class KDD_EXPORT DcmInputCurlStream : public DcmInputStream
 {
 public:
     explicit DcmInputCurlStream(KxCurlDownloadStream&& stream);

@@ -1,6 +1,7 @@
 #pragma once
 
 #include "kddlib/net/DownloadProducer.h"
+#include "platform/base/Export.h"
 
 #include <dcmtk/config/osconfig.h>
 
@@ -12,7 +13,7 @@ namespace Kdd
 {
 
 /// A request of its own as the source of DCMTK's parser. Without one it is in error.
-class DcmHttpProducer : public DownloadProducer
+class KDD_EXPORT DcmHttpProducer : public DownloadProducer
 {
 public:
     /// Sends the token, when it is not empty, as "Authorization: Bearer ...". What cannot even be sent throws as
@@ -21,7 +22,7 @@ public:
 };
 
 /// A file of a storage server as DCMTK's parser reads it. As with a download, all values have to be read at once.
-class DcmInputHttpStream : public DcmInputStream
+class KDD_EXPORT DcmInputHttpStream : public DcmInputStream
 {
 public:
     DcmInputHttpStream();

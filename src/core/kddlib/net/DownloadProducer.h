@@ -1,6 +1,7 @@
 #pragma once
 
 #include "kddlib/net/KxCurlDownloadStream.h"
+#include "platform/base/Export.h"
 #include "platform/base/Stopwatch.h"
 
 #include <QtGlobal>
@@ -22,7 +23,7 @@ namespace Kdd
 ///
 /// Conditions: "End-of-file reached on input operation" for bytes beyond the end, "Read/write error on IO operation"
 /// when the transfer broke off, "Logical error on IO operation" without a stream, "putback failed".
-class DownloadProducer : public DcmProducer
+class KDD_EXPORT DownloadProducer : public DcmProducer
 {
 public:
     DownloadProducer();

@@ -9,6 +9,7 @@
 #include "kddlib/net/KxCurlUploadStreambuf.h"
 #include "kddlib/net/KxGoogleAuth.h"
 #include "kddlib/net/PreparedRequest.h"
+#include "kddlib/net/Redirects.h"
 #include "kddlib/net/RequestAddress.h"
 #include "kddlib/net/TlsLocks.h"
 #include "platform/resources/ExResource.h"
@@ -48,6 +49,12 @@ CurlShare::Connections connectionsOfSite()
                                            : CurlShare::Connections::PerHandle;
 }
 
+void requireCloudObject(const std::string& address)
+{
+    if (const std::string reason = whyNoCloudObject(address); !reason.empty())
+        throw std::invalid_argument(address + ' ' + reason);
+}
+
 /// The rest of a stream of which nobody says how long it is, up to the bound of a response.
 QByteArray readUntilEnd(std::istream& stream)
 {
@@ -76,7 +83,10 @@ QByteArray readWhole(KxCurlDownloadStream& stream, KxHttpStatus& status)
     }
     status = stream.httpStatus();
     // No status of the server tells that reading ended at our bound.
-    status.failed |= stream.isOpen();
+    if (stream.isOpen() && !status.failed) {
+        status.failed = true;
+        status.failure = "The response has a body of more than 1 GiB";
+    }
     return bytes;
 }
 
@@ -99,14 +109,22 @@ struct KxCurlClient::Private
 
     KxCurlDownloadStream open(KxCurlDownloadRequest::Origin origin,
                               std::optional<ByteRange> firstRange) const;
-    KxCurlDownloadStream get(const std::string& url, std::vector<std::string> headers,
+    KxCurlDownloadStream get(const std::function<PreparedRequest()>& prepare,
                              std::optional<ByteRange> firstRange) const;
+    QJsonDocument post(const std::function<PreparedRequest()>& prepare, const QByteArray& body,
+                       KxHttpStatus& status) const;
 
     mutable std::mutex mutex;
     ClientSettings settings;
     KxGoogleAuth googleAuthentication;
-    CurlShare share{connectionsOfSite()};
-    std::shared_ptr<KxCurlHandleFactory> handles = std::make_shared<KxCurlHandleFactory>(kIdleHandles);
+    const CurlShare::Connections connections = connectionsOfSite();
+    CurlShare share{connections};
+    std::shared_ptr<KxCurlHandleFactory> handles =
+        std::make_shared<KxCurlHandleFactory>(kIdleHandles, connections);
+
+    /// For uploads and deletions: a handle that has carried a stream has no connection left for these.
+    std::shared_ptr<KxCurlHandleFactory> ownHandles =
+        std::make_shared<KxCurlHandleFactory>(kIdleHandles, connections);
 };
 
 /// The stream once the first bytes of its response are there.
@@ -122,13 +140,10 @@ KxCurlDownloadStream KxCurlClient::Private::open(KxCurlDownloadRequest::Origin o
     return stream;
 }
 
-KxCurlDownloadStream KxCurlClient::Private::get(const std::string& url, std::vector<std::string> headers,
+KxCurlDownloadStream KxCurlClient::Private::get(const std::function<PreparedRequest()>& prepare,
                                                 std::optional<ByteRange> firstRange) const
 {
     KxCurlDownloadRequest::Origin origin;
-    const auto prepare = [this, url, headers = std::move(headers)] {
-        return prepareRequest(url, headers, RequestBody::None, currentSettings());
-    };
     // What is to be had without authorisation must not ask for it, in vain, with every range.
     PreparedRequest first = prepare();
     if (isAuthorised(first))
@@ -136,6 +151,17 @@ KxCurlDownloadStream KxCurlClient::Private::get(const std::string& url, std::vec
     else
         origin.prepare = [first = std::move(first)] { return PreparedRequest(first); };
     return open(std::move(origin), firstRange);
+}
+
+QJsonDocument KxCurlClient::Private::post(const std::function<PreparedRequest()>& prepare,
+                                          const QByteArray& body, KxHttpStatus& status) const
+{
+    KxCurlDownloadRequest::Origin origin;
+    origin.prepare = prepare;
+    origin.body = body;
+    origin.hasBody = RequestBody::Sent;
+    KxCurlDownloadStream stream = open(std::move(origin), std::nullopt);
+    return QJsonDocument::fromJson(readWhole(stream, status));
 }
 
 KxCurlClient::KxCurlClient()
@@ -219,7 +245,10 @@ KxCurlDownloadStream KxCurlClient::read(const std::string& url, const std::vecto
     // Who asks for a range himself gets that range; ours would take its place.
     const bool hasRange = std::any_of(headers.begin(), headers.end(), isRangeHeader);
     const auto range = partial && !hasRange ? firstRange(mPrivate->currentSettings()) : std::nullopt;
-    return mPrivate->get(url, headers, range);
+    const auto prepare = [=] {
+        return prepareRequest(url, headers, RequestBody::None, mPrivate->currentSettings());
+    };
+    return mPrivate->get(prepare, range);
 }
 
 KxCurlDownloadStream KxCurlClient::readRange(const std::string& url, const std::string& range, bool partial)
@@ -230,7 +259,38 @@ KxCurlDownloadStream KxCurlClient::readRange(const std::string& url, const std::
 KxCurlDownloadStream KxCurlClient::readFrom(const std::string& url, qint64 start)
 {
     const auto range = firstRange(mPrivate->currentSettings(), start);
-    return range ? mPrivate->get(url, {}, range) : readRange(url, std::to_string(start) + '-', false);
+    if (!range)
+        return readRange(url, std::to_string(start) + '-', false);
+    return mPrivate->get(
+        [=] { return prepareRequest(url, {}, RequestBody::None, mPrivate->currentSettings()); }, range);
+}
+
+KxCurlDownloadStream KxCurlClient::readFollowing(const std::string& url, qint64 start)
+{
+    const auto range = firstRange(mPrivate->currentSettings(), start);
+    std::vector<std::string> headers;
+    if (!range && start > 0)
+        headers.push_back("Range: bytes=" + std::to_string(start) + '-');
+    std::optional<Redirects> redirects;
+    for (;;) {
+        const auto prepare = [=] {
+            const ClientSettings settings = mPrivate->currentSettings();
+            PreparedRequest first = prepareRequest(url, headers, RequestBody::None, settings);
+            return redirects ? redirects->prepared(std::move(first), settings) : first;
+        };
+        KxCurlDownloadStream stream = mPrivate->get(prepare, range);
+        if (!redirects)
+            redirects.emplace(prepareRequest(url, {}, RequestBody::None, ClientSettings()).url);
+        switch (redirects->take(stream.httpStatus())) {
+        case Redirects::Answer::Final:
+            return stream;
+        case Redirects::Answer::Refused:
+            static_cast<KxCurlDownloadStreambuf*>(stream.rdbuf())->currentRequest()->fail(redirects->fault());
+            return stream;
+        case Redirects::Answer::GoOn:
+            break;
+        }
+    }
 }
 
 QByteArray KxCurlClient::readBytes(const std::string& url, KxHttpStatus& status)
@@ -247,15 +307,20 @@ QJsonDocument KxCurlClient::readJson(const std::string& url, KxHttpStatus& statu
 QJsonDocument KxCurlClient::postBytes(const std::string& url, const QByteArray& body,
                                       const std::string& contentType, KxHttpStatus& status)
 {
-    KxCurlDownloadRequest::Origin origin;
-    origin.prepare = [&] {
+    const auto prepare = [&] {
         return prepareRequest(url, {"Content-Type: " + contentType}, RequestBody::Sent,
                               mPrivate->currentSettings());
     };
-    origin.body = body;
-    origin.hasBody = RequestBody::Sent;
-    KxCurlDownloadStream stream = mPrivate->open(std::move(origin), std::nullopt);
-    return QJsonDocument::fromJson(readWhole(stream, status));
+    return mPrivate->post(prepare, body, status);
+}
+
+QJsonDocument KxCurlClient::postWithoutSession(const std::string& url, const QByteArray& body,
+                                               const std::string& contentType, KxHttpStatus& status)
+{
+    const auto prepare = [&] {
+        return prepareRequest(url, {"Content-Type: " + contentType}, RequestBody::Sent, ClientSettings());
+    };
+    return mPrivate->post(prepare, body, status);
 }
 
 QJsonDocument KxCurlClient::postBytes(const std::string& url, const QByteArray& body, KxHttpStatus& status)
@@ -270,13 +335,14 @@ QJsonDocument KxCurlClient::postJson(const std::string& url, const QJsonObject& 
 
 KxCurlUploadStream KxCurlClient::write(const std::string& url)
 {
-    if (!namesCloudObject(url))
-        throw std::invalid_argument(url + " names no object of the cloud storage");
+    requireCloudObject(url);
     UploadTarget target;
     target.url = cloudUrl(url, CloudEndpoint::Upload);
-    target.authorization = authorizationHeader(mPrivate->currentSettings());
+    // Without credentials each chunk would ask for them in vain.
+    if (!authorizationHeader(mPrivate->currentSettings()).empty())
+        target.authorization = [this] { return authorizationHeader(mPrivate->currentSettings()); };
     auto session = std::make_unique<KxCurlUploadSession>(
-        mPrivate->handles, mPrivate->share, std::move(target),
+        mPrivate->ownHandles, mPrivate->share, std::move(target),
         [](std::chrono::milliseconds delay) { std::this_thread::sleep_for(delay); });
     return KxCurlUploadStream(std::make_unique<KxCurlUploadStreambuf>(std::move(session)));
 }
@@ -285,10 +351,9 @@ bool KxCurlClient::deleteObject(const std::string& url)
 {
     if (!isCloudAddress(url))
         return true;
-    // Handles of its own, as deletions are rare and must not push out what reads keep.
-    const auto handles = std::make_shared<KxCurlHandleFactory>(1);
+    requireCloudObject(url);
     const ClientSettings settings = mPrivate->currentSettings();
-    KxCurlRequest request(handles, mPrivate->share, cloudUrl(url, CloudEndpoint::Api), "DELETE");
+    KxCurlRequest request(mPrivate->ownHandles, mPrivate->share, cloudUrl(url, CloudEndpoint::Api), "DELETE");
     for (const std::string& line : cloudHeaders(authorizationHeader(settings)))
         request.addHeader(line);
     request.perform();

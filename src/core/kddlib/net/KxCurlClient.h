@@ -26,6 +26,9 @@ struct KxHttpStatus;
 /// A copy acts on the same state. Any thread may use it. Settings may be changed at any time and hold for requests
 /// that begin afterwards. Certificates are checked only when the site's settings ask for it (KDD_TLS_VERIFY).
 ///
+/// Names of objects and paths are escaped where an address could not hold them (`#`, blanks, control characters, bytes
+/// beyond ASCII); "%" and "?" stay, so that escaped names and queries can be handed over. URLs of HTTP go out as given.
+///
 /// The operations that send something throw CurlError when a request cannot be set up; std::runtime_error "Failed to
 /// add curl request header" when a header line is not to be had or would be several lines. A transfer that breaks off
 /// throws nothing: the trace log has the reason, the status counts as failed, and what has arrived is returned.
@@ -42,7 +45,8 @@ public:
     /// The URL of a path of the own web service; nothing is escaped.
     static std::string url(const std::string& path);
 
-    /// Sent as the query's "s" to all but the cloud storage, unescaped; empty: not at all.
+    /// Sent as the query's "s", unescaped, to all but the cloud storage and the places where tokens come from, or to the
+    /// hosts that the site's settings name (KDD_SESSION_HOSTS); empty: not at all.
     std::string sessionID() const;
     void setSessionID(const std::string& id);
 
@@ -76,6 +80,11 @@ public:
     /// it so. With `start` beyond 0 it fails where the server knows no ranges or not the object's length.
     KxCurlDownloadStream readFrom(const std::string& url, qint64 start);
 
+    /// The same from `start` on, wherever the server redirects to: up to five times, never from HTTPS to HTTP. Another
+    /// server than the one that was asked is told neither authorisation nor session. A redirect that may not be followed
+    /// fails the transfer.
+    KxCurlDownloadStream readFollowing(const std::string& url, qint64 start = 0);
+
     /// The whole body, which may be up to 1 GiB; a longer one breaks off there.
     QByteArray readBytes(const std::string& url, KxHttpStatus& status);
 
@@ -92,18 +101,24 @@ public:
     /// The same with the object, indented, as "application/json".
     QJsonDocument postJson(const std::string& url, const QJsonObject& object, KxHttpStatus& status);
 
-    /// Begins to write an object of the cloud storage. std::invalid_argument when the address names none;
+    /// Begins to write an object of the cloud storage. std::invalid_argument, before anything is sent, when the address
+    /// can be none's: it names no object, has a "?", a "%" without two digits or a part of dots only.
     /// UnrecoverableResponseError when the storage refuses; RetryPolicyExhaustedError when it cannot be reached, which
     /// takes some 15 to 20 seconds.
     KxCurlUploadStream write(const std::string& url);
 
     /// Deletes an object of the cloud storage: whether the storage says so. Any other address is left alone, and the
-    /// answer is true. CurlError also when the transfer breaks off.
+    /// answer is true. std::invalid_argument as for `write`. CurlError also when the transfer breaks off.
     bool deleteObject(const std::string& url);
 
 private:
+    friend class KxGoogleAuth;
     struct Private;
     KxCurlClient();
+
+    /// As postBytes, but the session is none of the server's business.
+    QJsonDocument postWithoutSession(const std::string& url, const QByteArray& body,
+                                     const std::string& contentType, KxHttpStatus& status);
 
     Private* mPrivate;  // lives as long as the process
 };

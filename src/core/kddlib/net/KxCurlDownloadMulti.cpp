@@ -1,5 +1,6 @@
 #include "kddlib/net/KxCurlDownloadRequest.h"
 
+#include <algorithm>
 #include <stdexcept>
 #include <utility>
 
@@ -37,6 +38,9 @@ void KxCurlDownloadRequest::MultiMap::add(KxCurlDownloadRequest& request)
 {
     CURL* const easy = request.mEasy.get();
     mRequests[easy] = &request;
+    // With fewer than there are requests, each range that ends would close the connection that the next one needs.
+    const long limit = std::max(mFactory->connectionLimit(), static_cast<long>(mRequests.size()));
+    curl_multi_setopt(mMulti.get(), CURLMOPT_MAXCONNECTS, limit);
     try {
         check(curl_multi_add_handle(mMulti.get(), easy));
     } catch (...) {

@@ -158,7 +158,14 @@ void KxCurlDownloadRequest::fail(const std::string& reason, const char* what)
         return;
     LogFile::tracef(3, "CURL", "%s: %s", what, reason.c_str());
     mStatus.failed = true;
-    mFailure = reason;
+    mStatus.failure = reason;
+}
+
+std::string KxCurlDownloadRequest::reasonOf(CURLcode code) const
+{
+    const std::string reason = mErrorText[0] ? mErrorText.data() : curl_easy_strerror(code);
+    const std::string cure = CurlError::cureFor(code);
+    return cure.empty() ? reason : reason + ". " + cure;
 }
 
 void KxCurlDownloadRequest::complete(CURLcode code)
@@ -172,7 +179,7 @@ void KxCurlDownloadRequest::complete(CURLcode code)
     try {
         mFault.rethrow();
         if (code != CURLE_OK)
-            fail((mErrorText[0] ? mErrorText.data() : curl_easy_strerror(code)) + CurlError::cureFor(code));
+            fail(reasonOf(code));
         else
             checkLength();
     } catch (const std::exception& fault) {

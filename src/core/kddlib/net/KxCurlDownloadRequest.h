@@ -27,7 +27,7 @@ class CurlShare;
 ///
 /// Nothing is delivered before the answer is known to be the one that was asked for: a request for a range takes that
 /// range of that object and nothing else. Whatever goes wrong after the start marks the status as failed, has its
-/// reason in the trace log under "CURL" and is told by `failure`.
+/// reason in the trace log under "CURL" and in the status.
 ///
 /// Used by one thread, as are all requests of one stream.
 class KxCurlDownloadRequest
@@ -90,7 +90,6 @@ public:
     const std::optional<ContentRange>& part() const { return mPart; }
 
     const KxHttpStatus& status() const { return mStatus; }
-    const std::string& failure() const { return mFailure; }
 
 private:
     friend class MultiMap;
@@ -102,6 +101,7 @@ private:
     bool resume();
     void deliver();
     void complete(CURLcode code);
+    std::string reasonOf(CURLcode code) const;
 
     static std::size_t receiveBody(char* bytes, std::size_t size, std::size_t count, void* request);
     std::size_t takeBody(const char* bytes, std::size_t length);
@@ -130,7 +130,6 @@ private:
     bool mPaused = false;
 
     KxHttpStatus mStatus;
-    std::string mFailure;
     CurlErrorText mErrorText{};
     CallbackFault mFault;
     HeaderReceiver mHeaderReceiver;

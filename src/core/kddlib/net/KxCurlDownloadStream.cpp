@@ -35,7 +35,6 @@ void KxCurlDownloadStream::takeBuffer(KxCurlDownloadStream& other)
 {
     mBuffer = std::move(other.mBuffer);
     mStatus = std::move(other.mStatus);
-    mFailure = std::move(other.mFailure);
     set_rdbuf(mBuffer.get());
     other.exceptions(goodbit);
     other.rdbuf(nullptr);
@@ -51,7 +50,6 @@ void KxCurlDownloadStream::close()
     if (!mBuffer)
         return;
     httpStatus();
-    mFailure = failure();
     mBuffer->close();
 }
 
@@ -67,12 +65,6 @@ const KxHttpStatus& KxCurlDownloadStream::httpStatus()
     if (const KxHttpStatus* status = mBuffer->status())
         mStatus = *status;
     return mStatus;
-}
-
-std::string KxCurlDownloadStream::failure() const
-{
-    const KxCurlDownloadRequest* request = mBuffer ? mBuffer->currentRequest() : nullptr;
-    return request ? request->failure() : mFailure;
 }
 
 }  // namespace Kdd

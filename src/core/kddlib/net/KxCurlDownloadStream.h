@@ -45,14 +45,13 @@ public:
     const KxHttpStatus& httpStatus();
 
     /// Why a transfer counts as failed; empty while it does not.
-    std::string failure() const;
+    std::string failure() { return httpStatus().failure; }
 
 private:
     void takeBuffer(KxCurlDownloadStream& other);
 
     std::unique_ptr<KxCurlDownloadStreambuf> mBuffer;
     KxHttpStatus mStatus;
-    std::string mFailure;
 };
 
 }  // namespace Kdd

@@ -47,8 +47,9 @@ Handle checked(Handle handle)
 
 }  // namespace
 
-KxCurlHandleFactory::KxCurlHandleFactory(std::size_t capacity)
+KxCurlHandleFactory::KxCurlHandleFactory(std::size_t capacity, CurlShare::Connections connections)
     : mCapacity(std::max<std::size_t>(capacity, 1))
+    , mConnections(connections)
     , mCipherList(cipherListOfSite())
 {
     mEasy.reserve(mCapacity);
@@ -58,9 +59,9 @@ KxCurlHandleFactory::KxCurlHandleFactory(std::size_t capacity)
 CurlEasy KxCurlHandleFactory::takeEasy()
 {
     const std::lock_guard lock(mMutex);
-    if (mEasy.empty())
-        return checked(CurlEasy(curl_easy_init()));
-    return takeLast(mEasy);
+    CurlEasy handle = mEasy.empty() ? checked(CurlEasy(curl_easy_init())) : takeLast(mEasy);
+    ++mInUse;
+    return handle;
 }
 
 void KxCurlHandleFactory::giveBack(CurlEasy handle)
@@ -70,15 +71,15 @@ void KxCurlHandleFactory::giveBack(CurlEasy handle)
     curl_easy_setopt(handle.get(), CURLOPT_SHARE, nullptr);
     CurlEasy oldest;  // cleaned up after the lock is gone, because that may close connections
     const std::lock_guard lock(mMutex);
+    --mInUse;
     oldest = keep(mEasy, mCapacity, std::move(handle));
 }
 
 CurlMulti KxCurlHandleFactory::takeMulti()
 {
     const std::lock_guard lock(mMutex);
-    if (!mEasy.empty() && !mMulti.empty())
-        return takeLast(mMulti);
-    CurlMulti handle = checked(CurlMulti(curl_multi_init()));
+    const bool isReused = !mEasy.empty() && !mMulti.empty();
+    CurlMulti handle = isReused ? takeLast(mMulti) : checked(CurlMulti(curl_multi_init()));
     curl_multi_setopt(handle.get(), CURLMOPT_MAXCONNECTS, connectionLimitLocked());
     return handle;
 }
@@ -110,7 +111,9 @@ long KxCurlHandleFactory::connectionLimit() const
 
 long KxCurlHandleFactory::connectionLimitLocked() const
 {
-    return std::max(static_cast<long>(mMaxConnects), static_cast<long>(mCapacity));
+    const long least = std::max(mMaxConnects, 1);
+    const bool isShared = mConnections == CurlShare::Connections::Shared;
+    return isShared ? std::max(least, static_cast<long>(std::max(mCapacity, mInUse + 1))) : least;
 }
 
 }  // namespace Kdd

@@ -1,5 +1,7 @@
 #pragma once
 
+#include "kddlib/net/CurlShare.h"
+
 #include <curl/curl.h>
 
 #include <cstddef>
@@ -28,9 +30,10 @@ using CurlMulti = std::unique_ptr<CURLM, CurlMultiCleanup>;
 class KxCurlHandleFactory
 {
 public:
-    /// Keeps up to `capacity` idle handles of each kind, at least one. The cipher list is taken from the environment
-    /// variable SSL_CIPHER_LIST where that is set, be it empty.
-    explicit KxCurlHandleFactory(std::size_t capacity);
+    /// Keeps up to `capacity` idle handles of each kind, at least one; `connections` is how their requests will hold
+    /// them. The cipher list is taken from the environment variable SSL_CIPHER_LIST where that is set, be it empty.
+    explicit KxCurlHandleFactory(std::size_t capacity,
+                                 CurlShare::Connections connections = CurlShare::Connections::PerHandle);
 
     /// A handle without options, idle or new. std::bad_alloc when curl cannot make one.
     CurlEasy takeEasy();
@@ -48,23 +51,25 @@ public:
     /// TLS ciphers up to TLS 1.2 in OpenSSL's form; empty leaves the choice to the TLS library.
     const std::string& cipherList() const { return mCipherList; }
 
-    /// Connections that a multi handle made from now on keeps open.
+    /// Connections that a multi handle taken from now on keeps open.
     int maxConnects() const;
     void setMaxConnects(int count);
 
-    /// How many open connections a transfer leaves at its end: `maxConnects`, but never fewer than handles are kept.
-    /// The connections are shared, and a transfer that ends trims all threads' connections to its own limit.
+    /// How many open connections a transfer leaves at its end: `maxConnects`. Where connections are shared, a transfer
+    /// that ends trims those of all threads to its own limit, so there it is as many as handles are kept or in use, too.
     long connectionLimit() const;
 
 private:
     long connectionLimitLocked() const;
 
     const std::size_t mCapacity;
+    const CurlShare::Connections mConnections;
     mutable std::mutex mMutex;
     std::vector<CurlEasy> mEasy;
     std::vector<CurlMulti> mMulti;
     std::string mCipherList;
     int mMaxConnects = 8;
+    std::size_t mInUse = 0;  // easy handles
 };
 
 }  // namespace Kdd

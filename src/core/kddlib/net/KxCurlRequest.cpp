@@ -48,8 +48,9 @@ void KxCurlRequest::perform()
 {
     try {
         run();
-    } catch (...) {
+    } catch (const std::exception& fault) {
         mStatus.failed = true;
+        mStatus.failure = fault.what();
         throw;
     }
 }

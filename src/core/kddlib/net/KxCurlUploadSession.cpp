@@ -66,8 +66,7 @@ void KxCurlUploadSession::start()
                 return;
             takeCode(code, "starting");
         } catch (const CurlError& error) {
-            mLastFault = error.what();
-            LogFile::warnf("Curl error while starting resumable upload: %s", error.what());
+            note(error, LogFile::Severity::Warning, "Curl error while starting resumable upload: ");
         }
         pause(policy);
     }
@@ -114,8 +113,7 @@ KxCurlUploadSession::Attempt KxCurlUploadSession::tryChunk(const QByteArray& res
         if (code != kResumeIncomplete && !mIsComplete)
             takeCode(code, "continuing");
     } catch (const CurlError& error) {
-        mLastFault = error.what();
-        LogFile::errorf("Recevied curl error: %s", error.what());
+        note(error, LogFile::Severity::Error, "Recevied curl error: ");
         return Attempt::Failed;
     }
     if (!mIsComplete && mNextOffset != end)
@@ -135,13 +133,21 @@ void KxCurlUploadSession::reset(RetryPolicy& policy)
                 return;
             takeCode(code, "resetting");
         } catch (const CurlError& error) {
-            mLastFault = error.what();
-            LogFile::warnf("Curl error while resetting resumable upload: %s", error.what());
+            note(error, LogFile::Severity::Warning, "Curl error while resetting resumable upload: ");
         }
         pause(policy);
     }
     throw RetryPolicyExhaustedError("Retry policy exhausted in KxCurlUploadSession::resetSession().",
                                     mLastFault);
+}
+
+/// A transfer that did not come through.
+void KxCurlUploadSession::note(const CurlError& error, LogFile::Severity severity, const char* what)
+{
+    LogFile::write(severity, what + textForLog(error));
+    mLastFault = error.what();
+    // It becomes part of a message of one line.
+    std::replace(mLastFault.begin(), mLastFault.end(), '\n', ' ');
 }
 
 /// An answer that brings the step no further.
@@ -185,9 +191,13 @@ std::vector<std::string> KxCurlUploadSession::storageHeaders(const std::string& 
     const WebOrigin origin = originOf(url);
     const bool isOwn =
         origin == originOf(mTarget.url) || origin == originOf(ExResource::cloudApiEndpoint().toStdString());
-    std::vector<std::string> lines = cloudHeaders(mTarget.authorization);
     if (!isOwn)
-        lines = {"Cache-Control: no-transform"};
+        return {"Cache-Control: no-transform"};
+    const std::string authorization = mTarget.authorization ? mTarget.authorization() : std::string();
+    // Without it the storage would refuse for good what may be told to it a little later.
+    if (mTarget.authorization && authorization.empty())
+        throw CurlError(CURLE_LOGIN_DENIED, "There is no access token");
+    std::vector<std::string> lines = cloudHeaders(authorization);
     lines.erase(std::remove(lines.begin(), lines.end(), std::string()), lines.end());
     return lines;
 }

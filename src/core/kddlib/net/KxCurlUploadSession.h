@@ -3,6 +3,7 @@
 #include "kddlib/net/KxCurlHandleFactory.h"
 #include "kddlib/net/RetryPolicy.h"
 #include "kddlib/net/UploadChecksums.h"
+#include "platform/base/LogFile.h"
 
 #include <QByteArray>
 
@@ -16,15 +17,19 @@
 namespace Kdd
 {
 
+class CurlError;
 class CurlShare;
 class KxCurlRequest;
 
 /// What is uploaded where.
 struct UploadTarget
 {
-    std::string url;            ///< of the object at the storage's upload host
-    std::string authorization;  ///< header line; may be empty
-    std::string contentType;    ///< of the object; empty leaves it to the storage
+    std::string url;  ///< of the object at the storage's upload host
+
+    /// Gives the header line for one request, empty when there is none at the moment; asked for each, because a long
+    /// upload outlives its token. Empty itself: requests go out unauthorised.
+    std::function<std::string()> authorization = {};
+    std::string contentType = {};  ///< of the object; empty leaves it to the storage
 };
 
 /// A resumable upload to the cloud storage: opens a session there and sends an object in chunks, each as often as it
@@ -62,6 +67,7 @@ private:
     void start();
     Attempt tryChunk(const QByteArray& rest, Chunk kind);
     void reset(RetryPolicy& policy);
+    void note(const CurlError& error, LogFile::Severity severity, const char* what);
     void takeCode(int code, const char* step);
     void pause(RetryPolicy& policy) const;
 

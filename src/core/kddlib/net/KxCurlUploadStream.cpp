@@ -57,6 +57,12 @@ std::string KxCurlUploadStream::error() const
     return mBuffer ? mBuffer->error() : std::string();
 }
 
+void KxCurlUploadStream::leaveErrorsToCaller()
+{
+    if (mBuffer)
+        mBuffer->leaveErrorsToCaller();
+}
+
 void KxCurlUploadStream::closeSilently() noexcept
 {
     exceptions(goodbit);

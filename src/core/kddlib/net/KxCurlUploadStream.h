@@ -47,6 +47,9 @@ public:
     /// Why the upload failed; empty when it did not.
     std::string error() const;
 
+    /// For a caller who tells of `error` himself: the log does not from now on.
+    void leaveErrorsToCaller();
+
 private:
     void closeSilently() noexcept;
     void takeBuffer(KxCurlUploadStream& other);

@@ -29,7 +29,8 @@ bool KxCurlUploadStreambuf::guard(const char* step, Step work)
         return true;
     } catch (const std::exception& fault) {
         mError = explained(fault);
-        LogFile::warnf("Got exception while trying to %s. Aborting.\n%s", step, fault.what());
+        if (mLogsErrors)
+            LogFile::warnf("Got exception while trying to %s. Aborting.\n%s", step, fault.what());
         return false;
     }
 }

@@ -30,6 +30,9 @@ public:
     /// Closes without making an object.
     void abandon();
 
+    /// From now on `error` alone tells what ended the upload, not the log as well.
+    void leaveErrorsToCaller() { mLogsErrors = false; }
+
     /// What ended the upload; empty as long as nothing did.
     const std::string& error() const { return mError; }
 
@@ -48,6 +51,7 @@ private:
     std::unique_ptr<char[]> mBytes;  // not cleared, so that small uploads touch little of it
     std::string mError;
     bool mIsOpen = true;
+    bool mLogsErrors = true;
 };
 
 }  // namespace Kdd

@@ -1,8 +1,11 @@
 #include "kddlib/net/KxDcmFileLoader.h"
 
+#include "kddlib/net/CurlError.h"
+#include "kddlib/net/DamagedFile.h"
 #include "kddlib/net/DcmInputCurlStream.h"
 #include "kddlib/net/DcmInputHttpStream.h"
 #include "kddlib/net/DicomParse.h"
+#include "kddlib/net/ForwardedStream.h"
 #include "kddlib/net/KxCurlClient.h"
 #include "kddlib/net/LocalFileStream.h"
 #include "kddlib/net/StoragePath.h"
@@ -34,6 +37,7 @@ struct Settings
 {
     std::mutex mutex;
     Mode mode = Mode::WholeLocal;
+    bool isModeChosen = false;
     std::string port;
     std::string bearerToken;
 };
@@ -54,15 +58,25 @@ std::string bearerToken()
 bool isAnswered(const char* name, KxCurlDownloadStream& stream)
 {
     const KxHttpStatus& status = stream.httpStatus();
-    if (status.ok())
-        return true;
-    LogFile::errorf("Reading %s failed: HTTP response code %d", name, status.code);
-    return false;
+    if (status.failed)
+        LogFile::errorf("Reading %s failed: %s", name, status.failure.c_str());
+    else if (!status.ok())
+        LogFile::errorf("Reading %s failed: HTTP response code %d", name, status.code);
+    return status.ok();
+}
+
+/// The parser's verdict, with the reason logged when it is that the transfer broke off, which is all the parser knows.
+OFCondition told(const char* name, KxCurlDownloadStream& stream, const OFCondition& condition)
+{
+    if (condition.bad() && stream.httpStatus().failed)
+        isAnswered(name, stream);
+    return condition;
 }
 
 OFCondition refuse(const char* name, const std::exception& fault)
 {
-    LogFile::errorf("Reading %s failed: %s", name, fault.what());
+    LogFile::write(LogFile::Severity::Error,
+                   "Reading " + LogFile::escaped(name) + " failed: " + textForLog(fault));
     return EC_InvalidStream;
 }
 
@@ -72,7 +86,7 @@ try {
     if (!isAnswered(name, download))
         return EC_InvalidStream;
     DepthLimited<DcmInputCurlStream> stream(std::move(download));
-    return parseDicom(stream, file, options);
+    return told(name, stream.curlStream(), parseDicom(stream, file, options));
 } catch (const std::exception& fault) {
     return refuse(name, fault);
 }
@@ -84,15 +98,23 @@ try {
     stream.request(url.c_str());
     if (!isAnswered(url.c_str(), stream.curlStream()))
         return EC_InvalidStream;
-    return parseDicom(stream, file, options);
+    return told(url.c_str(), stream.curlStream(), parseDicom(stream, file, options));
 } catch (const std::exception& fault) {
     return refuse(url.c_str(), fault);
+}
+
+/// How the library itself loads: what nobody asks for is not read, as long as nobody has chosen otherwise.
+Mode ownMode()
+{
+    const std::lock_guard lock(settings().mutex);
+    return settings().isModeChosen ? settings().mode : Mode::BoundedLocal;
 }
 
 OFCondition loadLocal(const char* name, DcmFileFormat& file, const ParseOptions& options)
 {
     DepthLimited<LocalFileStream> stream(name);
-    return parseDicom(stream, file, options);
+    const OFCondition condition = parseDicom(stream, file, options);
+    return condition.good() || options.reader ? condition : readAsRegistered(name, file, condition);
 }
 
 OFCondition load(const char* name, DcmFileFormat& file, Mode mode, ParseOptions options)
@@ -140,7 +162,8 @@ OFCondition KxDcmFileLoader::loadFile(const char* name, DcmFileFormat& file, Mod
 OFCondition KxDcmFileLoader::read(DcmInputStream& stream, E_TransferSyntax syntax,
                                   E_GrpLenEncoding groupLength, unsigned long maxReadLength)
 {
-    return parseStream(stream, mFile, {syntax, groupLength, bound(maxReadLength), ERM_autoDetect, {}});
+    DepthLimited<ForwardedStream> limited(stream);
+    return parseDicom(limited, mFile, {syntax, groupLength, bound(maxReadLength), ERM_autoDetect, {}});
 }
 
 OFCondition KxDcmFileLoader::validateMetaInfo(E_TransferSyntax syntax, E_FileWriteMode writeMode)
@@ -156,7 +179,10 @@ OFCondition KxDcmFileLoader::readUntilEnd()
 Mode KxDcmFileLoader::setDefaultMode(Mode mode)
 {
     const std::lock_guard lock(settings().mutex);
-    return mode == Mode::Default ? settings().mode : std::exchange(settings().mode, mode);
+    if (mode == Mode::Default)
+        return settings().mode;
+    settings().isModeChosen = true;
+    return std::exchange(settings().mode, mode);
 }
 
 Mode KxDcmFileLoader::defaultMode()
@@ -206,9 +232,7 @@ std::string KxDcmFileLoader::convertPathToExternalURL(const char* path)
 
 OFCondition loadDicomFile(const char* name, DcmFileFormat& file)
 {
-    const bool asksServers = KxDcmFileLoader::defaultMode() == Mode::StorageServer;
-    const Mode mode = asksServers ? Mode::StorageServer : Mode::BoundedLocal;
-    return KxDcmFileLoader::loadFile(name, file, mode, kOwnBound);
+    return KxDcmFileLoader::loadFile(name, file, ownMode(), kOwnBound);
 }
 
 }  // namespace Kdd

@@ -26,8 +26,9 @@ public:
     /// How a name that is no URL is read.
     enum class Mode : quint32 {
         Default = 0,  ///< as the process-wide setting has it
-        BoundedLocal =
-            1,  ///< from the local file; values longer than the caller's bound stay there until asked for
+        /// From the local file; values longer than the caller's bound stay there until asked for, and are refused then
+        /// when the file is not the same any more.
+        BoundedLocal = 1,
         WholeLocal = 2,    ///< from the local file, with all values
         StorageServer = 3  ///< a path of the storage servers by HTTP, any other as WholeLocal
     };
@@ -91,8 +92,8 @@ private:
     DcmFileFormat mFile;
 };
 
-/// Loads a file as the library itself does: long values stay in a local file until they are asked for, unless the
-/// process-wide setting has storage paths read by HTTP.
+/// Loads a file as the library itself does: in the process-wide mode once that was set, until then as BoundedLocal, with
+/// long values staying in the file until they are asked for.
 KDD_EXPORT OFCondition loadDicomFile(const char* name, DcmFileFormat& file);
 
 }  // namespace Kdd

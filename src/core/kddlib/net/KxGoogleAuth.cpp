@@ -134,11 +134,13 @@ QByteArray KxGoogleAuth::Private::fetch(KxCurlClient& client, qint64 now)
         return {};
     KxHttpStatus status;
     const QJsonDocument answer =
-        client.postBytes(key.tokenUri, body, "application/x-www-form-urlencoded", status);
+        client.postWithoutSession(key.tokenUri, body, "application/x-www-form-urlencoded", status);
     if (status.ok())
         return takeAnswer(answer, now);
+    const QByteArray reason =
+        status.failed ? QByteArray::fromStdString(status.failure) : withoutToken(answer);
     LogFile::errorf("Could not get authorization header from %s, response code %d. %s", key.tokenUri.c_str(),
-                    status.code, withoutToken(answer).constData());
+                    status.code, reason.constData());
     return {};
 }
 

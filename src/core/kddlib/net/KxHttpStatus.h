@@ -29,6 +29,9 @@ struct KDD_EXPORT KxHttpStatus
     /// From the making of the request to the first line of the response [ms].
     qint32 msToFirstHeader = 0;
 
+    /// Why it counts as failed; empty while it does not.
+    std::string failure = {};
+
     /// A code from 200 to 299, and not failed.
     bool ok() const { return code >= 200 && code <= 299 && !failed; }
 

@@ -4,7 +4,10 @@
 
 #include <dcmtk/config/osconfig.h>
 
-#include <dcmtk/dcmdata/dcistrmf.h>
+#include <dcmtk/dcmdata/dcistrma.h>
+
+#include <string>
+#include <utility>
 
 namespace Kdd
 {
@@ -20,15 +23,50 @@ public:
     {
     }
 
-    /// How DCMTK finds a long value again that it has left in the file. In deflated data no offset leads to it.
-    DcmInputStreamFactory* newFactory() const override
+    /// The rest of a file behind `offset`, which is in error when it is not the file of `identity` any more.
+    LocalFileStream(const std::string& path, qint64 offset, const FileIdentity& identity)
+        : DcmInputStream(&mProducer)
+        , mProducer(path.c_str(), offset, identity)
+        , mPath(path)
+        , mStart(offset)
     {
-        return currentProducer() == &mProducer ? new DcmInputFileStreamFactory(mPath, tell()) : nullptr;
     }
+
+    /// How DCMTK finds a long value again that it has left in the file. In deflated data no offset leads to it.
+    DcmInputStreamFactory* newFactory() const override;
 
 private:
     BufferedFileProducer mProducer;
-    OFFilename mPath;
+    std::string mPath;
+    qint64 mStart = 0;
 };
+
+/// Opens a file again for a value that was left in it. A file that was written anew has other bytes at that place, and
+/// they would pass for the value.
+class LeftValueFactory : public DcmInputStreamFactory
+{
+public:
+    LeftValueFactory(std::string path, qint64 offset, const FileIdentity& identity)
+        : mPath(std::move(path))
+        , mOffset(offset)
+        , mIdentity(identity)
+    {
+    }
+
+    DcmInputStream* create() const override { return new LocalFileStream(mPath, mOffset, mIdentity); }
+    DcmInputStreamFactory* clone() const override { return new LeftValueFactory(*this); }
+    DcmInputStreamFactoryType ident() const override { return DFT_DcmInputFileStreamFactory; }
+
+private:
+    std::string mPath;
+    qint64 mOffset;  // 0-based
+    FileIdentity mIdentity;
+};
+
+inline DcmInputStreamFactory* LocalFileStream::newFactory() const
+{
+    const bool isPlain = currentProducer() == &mProducer;
+    return isPlain ? new LeftValueFactory(mPath, mStart + tell(), mProducer.identity()) : nullptr;
+}
 
 }  // namespace Kdd

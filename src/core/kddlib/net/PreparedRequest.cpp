@@ -1,8 +1,11 @@
 #include "kddlib/net/PreparedRequest.h"
 
 #include "kddlib/net/RequestAddress.h"
+#include "kddlib/net/WebOrigin.h"
+#include "platform/resources/ExResource.h"
 
 #include <QByteArray>
+#include <QList>
 
 #include <algorithm>
 #include <utility>
@@ -13,6 +16,29 @@ namespace
 {
 
 constexpr qint64 kSmallestLastByte = 1024;
+
+/// Whether the site lets the host of a URL know the session.
+bool mayKnowSession(const std::string& url)
+{
+    const QByteArray hosts = ExResource::sessionHosts();
+    if (hosts.isEmpty())
+        return true;
+    const WebOrigin origin = originOf(url);
+    const QByteArray host = QByteArray::fromStdString(origin.host);
+    const QList<QByteArray> known = QByteArray(hosts).replace(',', ' ').toLower().simplified().split(' ');
+    return origin.isValid() &&
+           (known.contains(host) || known.contains(host + ':' + QByteArray::fromStdString(origin.port)));
+}
+
+std::string withSession(const std::string& url, const std::string& id)
+{
+    return id.empty() || !mayKnowSession(url) ? url : withSessionId(url, id);
+}
+
+bool hasSession(const std::string& url, const std::string& id)
+{
+    return url.find("?s=" + id) != std::string::npos || url.find("&s=" + id) != std::string::npos;
+}
 
 }  // namespace
 
@@ -42,7 +68,7 @@ PreparedRequest prepareRequest(const std::string& address, std::vector<std::stri
     if (body == RequestBody::Sent)
         request.headers.emplace_back("Expect: ");
     if (!isCloudAddress(address)) {
-        request.url = withSessionId(address, settings.sessionId);
+        request.url = withSession(address, settings.sessionId);
         return request;
     }
     request.url =
@@ -53,6 +79,21 @@ PreparedRequest prepareRequest(const std::string& address, std::vector<std::stri
             request.headers.push_back(std::move(line));
     }
     return request;
+}
+
+PreparedRequest redirected(PreparedRequest prepared, const std::string& url, bool isSameOrigin,
+                           const ClientSettings& settings)
+{
+    const bool hadSession = hasSession(prepared.url, settings.sessionId);
+    if (!isSameOrigin) {
+        const auto others =
+            std::stable_partition(prepared.headers.begin(), prepared.headers.end(), isRangeHeader);
+        prepared.headers.erase(others, prepared.headers.end());
+    }
+    // The server's own answer may bring it along.
+    const bool needsSession = isSameOrigin && hadSession && !hasSession(url, settings.sessionId);
+    prepared.url = needsSession ? withSession(url, settings.sessionId) : url;
+    return prepared;
 }
 
 std::optional<ByteRange> firstRange(const ClientSettings& settings, qint64 start)

@@ -32,10 +32,16 @@ struct PreparedRequest
 enum class RequestBody { None, Sent };
 
 /// Makes the address that a caller gave into a URL and adds what the address asks for to the caller's header lines:
-/// for the cloud storage authorisation, when there is one, for all else the session's id. Passes on what the
+/// for the cloud storage authorisation, when there is one, for all else the session's id where the host may
+/// know it. Passes on what the
 /// authorisation throws.
 PreparedRequest prepareRequest(const std::string& address, std::vector<std::string> headers, RequestBody body,
                                const ClientSettings& settings);
+
+/// What `prepared` becomes when a server has redirected it to `url`: of the same origin, with the same header lines and
+/// the session again, if it had one; anywhere else (`isSameOrigin` false) with nothing but the range.
+PreparedRequest redirected(PreparedRequest prepared, const std::string& url, bool isSameOrigin,
+                           const ClientSettings& settings);
 
 /// Whether it carries an authorisation.
 bool isAuthorised(const PreparedRequest& request);

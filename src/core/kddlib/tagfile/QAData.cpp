@@ -18,7 +18,9 @@ namespace
 class JobReader
 {
 public:
-    explicit JobReader(const QByteArray& xml)
+    /// Of bytes the declaration in the XML says how they are encoded; a text is none any more, whatever it says.
+    template <typename Xml>
+    explicit JobReader(const Xml& xml)
         : mXml(xml)
     {
     }
@@ -83,7 +85,7 @@ private:
 
     void readLogin()
     {
-        const QString text = mXml.readElementText();
+        const QString text = mXml.readElementText().trimmed();
         mJob.login = text.toLatin1();
         if (QString::fromLatin1(mJob.login) != text || !isOneLine(text))
             raise(QStringLiteral("Login \"%1\" is not one line of Latin-1 characters").arg(text));
@@ -154,6 +156,20 @@ private:
 }  // namespace
 
 bool QAData::parse(const QByteArray& xml, QString& message)
+{
+    return take(xml, message);
+}
+
+bool QAData::parseText(const QString& xml, QString& message)
+{
+    if (xml.isValidUtf16())
+        return take(xml, message);
+    message = QStringLiteral("The text of the job has half a character");
+    return false;
+}
+
+template <typename Xml>
+bool QAData::take(const Xml& xml, QString& message)
 {
     if (xml.size() > kMaxJobXml) {
         message = QStringLiteral("A job of %1 bytes is longer than %2").arg(xml.size()).arg(kMaxJobXml);

@@ -31,8 +31,8 @@ struct KDD_EXPORT QAData
     QByteArray studyUID;
     QByteArray oldStudyUID;  ///< empty for an edit
     QVector<QASubstitution> substitutions;
-    QByteArray timestamp;            ///< "yyyyMMddhhmmss", or empty for now
-    QByteArray login;                ///< who corrects, in Latin-1; may be empty
+    QByteArray timestamp;            ///< "yyyyMMddhhmmss" as the job has it, or blank for now
+    QByteArray login;                ///< who corrects, one line of Latin-1; may be empty
     QList<QByteArray> images;        ///< SOP Instance UIDs
     QList<QByteArray> cacheEntries;  ///< names of file-cache entries, for the caller's use
 
@@ -56,11 +56,19 @@ struct KDD_EXPORT QAData
     ///       </Substitutions>
     ///     </Job>
     ///
-    /// Elements count by their names, wherever they stand; others are passed over. False, with the job as it was and
-    /// the line and the reason in `message`, for XML that is damaged, larger than `kMaxJobXml` or has a document type,
-    /// for a number, timestamp or login that is none, for a Tag without Value (but for Pixel Data) or that stands
-    /// twice.
+    /// Elements count by their names, wherever they stand; others are passed over. A timestamp may have white space
+    /// around it and a fraction of the second, and is kept with them; a login loses the white space around it. False,
+    /// with the job as it was and the line and the reason in `message`, for XML that is damaged, larger than
+    /// `kMaxJobXml` or has a document type, for a number, timestamp or login that is none, for a Tag without Value (but
+    /// for Pixel Data) or that stands twice.
+    ///
+    /// Bytes are in the encoding that the XML declares, else in UTF-8. Of a text the declaration counts for nothing.
     bool parse(const QByteArray& xml, QString& message);
+    bool parseText(const QString& xml, QString& message);
+
+private:
+    template <typename Xml>
+    bool take(const Xml& xml, QString& message);
 };
 
 }  // namespace Kdd

@@ -9,6 +9,7 @@
 
 #include <QDateTime>
 #include <QLocale>
+#include <QRegularExpression>
 
 #include <dcmtk/dcmdata/dcdeftag.h>
 
@@ -22,7 +23,6 @@ namespace Kdd
 namespace
 {
 
-constexpr int kTimestampLength = 14;
 constexpr int kLongestUid = 64;
 constexpr quint16 kOurPublicGroup = 0x0006;
 
@@ -153,15 +153,19 @@ bool isOneLine(const QString& text)
     return std::all_of(text.begin(), text.end(), [](QChar c) { return c.isPrint(); });
 }
 
-/// Without a time zone: what a scanner of another zone calls half past two may be skipped by the clocks here.
+/// Without a time zone: what a scanner of another zone calls half past two may be skipped by the clocks here. White space
+/// around the timestamp, fractions of the second and the zone, which all are left out, come from writers that take it
+/// for any DICOM time.
 bool auditTime(const QByteArray& timestamp, QString& time)
 {
+    static const QRegularExpression form(QStringLiteral("^(\\d{8})(\\d{6})(\\.\\d*)?([+-]\\d{4})?$"));
     QDateTime moment = QDateTime::currentDateTime();
-    if (!timestamp.isEmpty()) {
-        const QString text = QString::fromLatin1(timestamp);
-        moment = QDateTime(QDate::fromString(text.left(8), QStringLiteral("yyyyMMdd")),
-                           QTime::fromString(text.mid(8), QStringLiteral("hhmmss")), Qt::UTC);
-        if (timestamp.size() != kTimestampLength || !moment.isValid())
+    const QString text = QString::fromLatin1(timestamp.trimmed());
+    if (!text.isEmpty()) {
+        const QRegularExpressionMatch parts = form.match(text);
+        moment = QDateTime(QDate::fromString(parts.captured(1), QStringLiteral("yyyyMMdd")),
+                           QTime::fromString(parts.captured(2), QStringLiteral("hhmmss")), Qt::UTC);
+        if (!moment.isValid())
             return false;
     }
     time = QLocale::c().toString(moment, QStringLiteral("d/M/yyyy h:mm:ss A"));

@@ -16,8 +16,8 @@ QString keyName(const DcmTagKey& key);
 /// Whether the text can stand in a line of an audit log as it is.
 bool isOneLine(const QString& text);
 
-/// A job's timestamp, or the present moment when it is empty, as audit logs tell it: "31/1/2024 12:00:00 PM". False
-/// when it is no time of the form "yyyyMMddhhmmss".
+/// A job's timestamp, or the present moment when it is blank, as audit logs tell it: "31/1/2024 12:00:00 PM". False when
+/// it is no time of the form "yyyyMMddhhmmss", which a fraction of the second and a time zone may follow.
 bool auditTime(const QByteArray& timestamp, QString& time);
 
 /// Why the job can be applied to no image at all; empty when nothing speaks against it.

@@ -20,6 +20,17 @@
 namespace Kdd
 {
 
+namespace
+{
+
+/// The caller's UIDs may be those of the very nodes that are removed.
+std::vector<QByteArray> textsOf(int count, const char** texts)
+{
+    return count > 0 ? std::vector<QByteArray>(texts, texts + count) : std::vector<QByteArray>();
+}
+
+}  // namespace
+
 TagFile::CompressionMode TagFile::sCompressionMode = CompressionMode::Zlib;
 Vec2i TagFile::sPreviewSize = {256, 256};
 unsigned int TagFile::sDebugOptions = 0;
@@ -71,15 +82,19 @@ QByteArray TagFile::imageKey(const TagMap& image)
 TagMap* TagFile::addTagMap(TagMap* map, const char* path, bool replace)
 {
     std::unique_ptr<TagMap> image(map);
+    // The path may be what the image says that is about to be replaced.
+    const QByteArray pathText(path);
     const QByteArray studyUID = image->uid(TagMap::StudyLevel);
     const QByteArray seriesUID = image->uid(TagMap::SeriesLevel);
     QByteArray key = imageKey(*image);
     const bool isKnownByPath = key.isEmpty() && path != nullptr;
     if (isKnownByPath)
-        key = path;
+        key = pathText;
     if (key.isEmpty() || (!mStudies.isEmpty() && mStudies.firstKey() != studyUID))
         return nullptr;
     if (TagMap* old = mImages.find(key)) {
+        if (old == map)
+            return image.release();
         if (!replace)
             return nullptr;
         replaceImage(old);
@@ -87,9 +102,9 @@ TagMap* TagFile::addTagMap(TagMap* map, const char* path, bool replace)
     mImages.insert(key, image.get());
     placeInSeries(image.get(), seriesUID, studyUID);
     if (path != nullptr)
-        image->putAndInsertValue(kFileSuffix, VrCode::LO, extractSuffix(path));
+        image->putAndInsertValue(kFileSuffix, VrCode::LO, extractSuffix(pathText.constData()));
     if (isKnownByPath)
-        image->putAndInsertValue(kFilePath, VrCode::LO, path);
+        image->putAndInsertValue(kFilePath, VrCode::LO, pathText);
     return image.release();
 }
 
@@ -164,12 +179,12 @@ TagMap* TagFile::takeImage(const QByteArray& sopUID)
 int TagFile::removeImages(int count, const char** sopUIDs)
 {
     int removed = 0;
-    for (int i = 0; i < count; ++i) {
-        TagMap* image = findImage(sopUIDs[i]);
+    for (const QByteArray& sopUID : textsOf(count, sopUIDs)) {
+        TagMap* image = findImage(sopUID);
         TagMap* series = image != nullptr ? image->parent() : nullptr;
         if (series == nullptr)
             continue;
-        mImages.take(sopUIDs[i]);
+        mImages.take(sopUID);
         delete image;
         ++removed;
         TagMap* study = series->parent();
@@ -184,8 +199,8 @@ int TagFile::removeImages(int count, const char** sopUIDs)
 int TagFile::removeSeries(int count, const char** seriesUIDs)
 {
     int removed = 0;
-    for (int i = 0; i < count; ++i) {
-        TagMap* series = findSeries(seriesUIDs[i]);
+    for (const QByteArray& seriesUID : textsOf(count, seriesUIDs)) {
+        TagMap* series = findSeries(seriesUID);
         if (series == nullptr)
             continue;
         for (const TagMap* image : series->children())

@@ -34,6 +34,8 @@ class TagMap;
 struct QAData;
 struct QASeriesMove;
 struct VolumeInfo;
+struct LockPolling;
+struct LockedOpenResult;
 enum class Flush;
 enum class IfAbsent;
 
@@ -91,7 +93,7 @@ public:
 
     /// Places an image and takes it over. Null, and the map is deleted, when it belongs to another study than the one
     /// held, when the image is there already and `replace` is false, or when it has neither SOP Instance UID nor path.
-    /// `path` may be null; it gives the image's file name suffix.
+    /// `path` may be null; it gives the image's file name suffix. A map that this object holds already stays.
     TagMap* addTagMap(TagMap* map, const char* path, bool replace);
 
     /// The same for a dataset, which is only read.
@@ -169,9 +171,16 @@ public:
     QString cacheFilePath() const;
 
     /// Reads the file at `path`; with `studyUID` not null only that study. With `keepOpen` the file is opened
-    /// exclusively and stays so until `writeCacheFile()` or `close()`; others that want it wait about two seconds.
+    /// exclusively and stays so until `writeCacheFile()` or `close()`. While others hold the file, it is tried for 0.4
+    /// seconds, as by corrections; a merge and a write try for 2 seconds.
     bool readCacheFile(const QString& path, const char* studyUID, bool keepOpen);
     bool readCacheFileForStudy(const char* studyUID, bool keepOpen);
+
+    /// The same for whoever serves others, who would rather wait than say that there is nothing: while others hold the
+    /// file, it is tried for as long as the site's settings say (`ExResource::readPatience`). That it stayed held is not
+    /// logged, for the caller knows what it means.
+    bool readWhenFree(const QString& path, const char* studyUID, bool keepOpen);
+    bool readWhenFreeForStudy(const char* studyUID, bool keepOpen);
 
     /// Reads from a stream. The object is empty when false is returned.
     bool readCacheFile(QDataStream& in, const char* studyUID);
@@ -181,7 +190,7 @@ public:
     bool writeCacheFile();
     bool writeCacheFile(const char* path);
 
-    /// Writes to a stream; false only when the study is too large for the format.
+    /// Writes to a stream. False, with nothing written, when the study holds what its reader would refuse or lose.
     bool writeCacheFile(QDataStream& out);
 
     /// Brings the images held here into the study's file, in place of images with the same UID, while the file is
@@ -207,6 +216,7 @@ public:
     /// Make and keep the preview of an image, and of a mammogram where the breast lies. False when the image is not
     /// held, cannot be loaded or cannot be shown, which is logged with `path`.
     bool addPreview(TagMap* image, DcmDataset* dataset, const QString& path);
+    bool addPreview(TagMap* image, const QByteArray& file);
     bool addPreview(const QByteArray& sopInstanceUID, const QString& path);
     bool addPreview(DcmDataset* dataset, const QString& path);
 
@@ -252,7 +262,7 @@ public:
 
     /// Reads the study's tag file and brings it into line with the image database, in memory only. `user` is for
     /// databases that ask who asks; ours does not. False when the database does not know the study or the file cannot
-    /// be read.
+    /// be read; a file that others hold is waited for as by `readWhenFree`.
     bool readAndSync(const char* studyUID, const char* user);
 
     /// Brings the tree into line with what the database says of the study: file paths, volume names, series that are
@@ -265,7 +275,8 @@ public:
     /// Why the last read, write or merge failed, in words; empty after success.
     const QString& failure() const { return mFailure; }
 
-    /// Whether it failed because others held the file all the time, so that trying again makes sense.
+    /// Whether it failed because others held the file all the time, or were just making it, so that trying again makes
+    /// sense and nothing is known of the study.
     bool wasLockedOut() const { return mLockedOut; }
 
     /// Closes the file held open; false if there is none.
@@ -308,6 +319,7 @@ private:
     };
 
     class BodyReader;
+    class BodyWriter;
     class QAJob;
     class QAVolumes;
 
@@ -334,9 +346,14 @@ private:
     bool failReading(const char* reason);
     bool failMerge(const QString& reason);
 
+    enum class Reader { Ordinary, Serving };
+
     static Flush flushing();
-    bool openForReading(const QString& path, bool keepOpen);
-    bool openWhole(const QString& path);
+    static LockPolling pollingOf(Reader reader);
+    bool readFile(const QString& path, const char* studyUID, bool keepOpen, Reader reader);
+    bool openForReading(const QString& path, bool keepOpen, Reader reader);
+    bool openWhole(const QString& path, Reader reader);
+    bool failToOpen(const LockedOpenResult& opened);
     bool finishInterruptedWrite(const QString& path);
     bool holdStudy(const QByteArray& studyUID, IfAbsent ifAbsent);
     bool createAndWrite(const QString& path);

@@ -4,6 +4,7 @@
 #include "platform/base/Stopwatch.h"
 #include "platform/os/ExclusiveFile.h"
 #include "platform/os/JournaledWrite.h"
+#include "platform/resources/ExResource.h"
 
 #include <QCryptographicHash>
 #include <QDataStream>
@@ -49,7 +50,32 @@ bool TagFile::readCacheFileForStudy(const char* studyUID, bool keepOpen)
 
 bool TagFile::readCacheFile(const QString& path, const char* studyUID, bool keepOpen)
 {
+    return readFile(path, studyUID, keepOpen, Reader::Ordinary);
+}
+
+bool TagFile::readWhenFreeForStudy(const char* studyUID, bool keepOpen)
+{
+    return readWhenFree(cacheFilePathForStudy(studyUID), studyUID, keepOpen);
+}
+
+bool TagFile::readWhenFree(const QString& path, const char* studyUID, bool keepOpen)
+{
+    return readFile(path, studyUID, keepOpen, Reader::Serving);
+}
+
+LockPolling TagFile::pollingOf(Reader reader)
+{
+    LockPolling polling = kReadPolling;
+    if (reader == Reader::Serving)
+        polling.attempts = qMax(polling.attempts, ExResource::readPatience() / polling.delayMs);
+    return polling;
+}
+
+bool TagFile::readFile(const QString& path, const char* studyUID, bool keepOpen, Reader reader)
+{
     const Stopwatch stopwatch;
+    const QByteArray wanted(studyUID);  // may be that of the study that is let go of now
+    mLockedOut = false;
     if (mCacheFile.isOpen()) {
         LogFile::warnf("Tag file already opened");
         return fail(QStringLiteral("Tag file already opened"));
@@ -57,10 +83,10 @@ bool TagFile::readCacheFile(const QString& path, const char* studyUID, bool keep
     clear();
     mFailure.clear();
     mCacheFilePath = path;
-    if (!openForReading(path, keepOpen))
+    if (!openForReading(path, keepOpen, reader))
         return false;
     QDataStream in(&mCacheFile);
-    const bool isRead = readCacheFile(in, studyUID);
+    const bool isRead = readCacheFile(in, studyUID != nullptr ? wanted.constData() : nullptr);
     if (!isRead || !keepOpen)
         mCacheFile.close();
     mStatistics.readMs = stopwatch.elapsed();
@@ -73,40 +99,49 @@ bool TagFile::readCacheFile(const QString& path, const char* studyUID, bool keep
 
 /// Opens the cache file, exclusively if it is to be kept open. A reader that meets the journal of a writer that died
 /// first finishes that write, for what the file holds may be torn.
-bool TagFile::openForReading(const QString& path, bool keepOpen)
+bool TagFile::openForReading(const QString& path, bool keepOpen, Reader reader)
 {
     if (keepOpen)
-        return openWhole(path);
+        return openWhole(path, reader);
     const LockedOpenResult opened =
-        openLockedFile(mCacheFile, path, FileLock::Shared, IfAbsent::Fail, kReadPolling);
-    mLockedOut = opened.failure == OpenFailure::Locked;
+        openLockedFile(mCacheFile, path, FileLock::Shared, IfAbsent::Fail, pollingOf(reader));
     if (!opened) {
-        const QString reason = systemText(opened.systemError);
-        if (opened.failure != OpenFailure::NotFound || LogFile::debugLogging())
-            LogFile::warnf("Could not open %s: %s", qUtf8Printable(path), qUtf8Printable(reason));
-        return fail(reason);
+        failToOpen(opened);
+        const bool isTold = opened.failure == OpenFailure::Locked
+                                ? reader == Reader::Ordinary
+                                : opened.failure != OpenFailure::NotFound || LogFile::debugLogging();
+        if (isTold)
+            LogFile::warnf("Could not open %s: %s", qUtf8Printable(path), qUtf8Printable(mFailure));
+        return false;
     }
     const bool isWhole = !hasJournal(path);
     // Its maker has not come to filling it yet, so the study has no tag file at this moment.
     if (isWhole && mCacheFile.size() == 0) {
         mCacheFile.close();
+        mLockedOut = true;
         return fail(systemText(ENOENT));
     }
     if (isWhole)
         return true;
     mCacheFile.close();
-    if (openWhole(path))
+    if (openWhole(path, reader))
         return true;
-    LogFile::warnf("Could not open %s: %s", qUtf8Printable(path), qUtf8Printable(mFailure));
+    if (!mLockedOut || reader == Reader::Ordinary)
+        LogFile::warnf("Could not open %s: %s", qUtf8Printable(path), qUtf8Printable(mFailure));
     return false;
 }
 
-bool TagFile::openWhole(const QString& path)
+bool TagFile::openWhole(const QString& path, Reader reader)
 {
     const LockedOpenResult opened =
-        openLockedFile(mCacheFile, path, FileLock::Exclusive, IfAbsent::Fail, kReadPolling);
+        openLockedFile(mCacheFile, path, FileLock::Exclusive, IfAbsent::Fail, pollingOf(reader));
+    return opened ? finishInterruptedWrite(path) : failToOpen(opened);
+}
+
+bool TagFile::failToOpen(const LockedOpenResult& opened)
+{
     mLockedOut = opened.failure == OpenFailure::Locked;
-    return opened ? finishInterruptedWrite(path) : fail(systemText(opened.systemError));
+    return fail(mLockedOut ? QStringLiteral("others hold it") : systemText(opened.systemError));
 }
 
 /// Opens the study's file exclusively and reads it. An absent or empty file holds no study, which is no failure.
@@ -120,11 +155,11 @@ bool TagFile::holdStudy(const QByteArray& studyUID, IfAbsent ifAbsent)
         QDir().mkpath(QFileInfo(path).path());
     const LockedOpenResult opened =
         openLockedFile(mCacheFile, path, FileLock::Exclusive, ifAbsent, kReadPolling);
-    mLockedOut = opened.failure == OpenFailure::Locked;
+    mLockedOut = false;
     if (opened.failure == OpenFailure::NotFound && ifAbsent == IfAbsent::Fail)
         return true;
     if (!opened)
-        return fail(systemText(opened.systemError));
+        return failToOpen(opened);
     if (!finishInterruptedWrite(path))
         return false;
     QDataStream in(&mCacheFile);
@@ -174,10 +209,10 @@ bool TagFile::createAndWrite(const QString& path)
     QFile file;
     const LockedOpenResult opened =
         openLockedFile(file, path, FileLock::Exclusive, IfAbsent::Create, kWritePolling);
-    mLockedOut = opened.failure == OpenFailure::Locked;
+    mLockedOut = false;
     if (!opened) {
         LogFile::errorf("Could not open %s for writing", qUtf8Printable(path));
-        return fail(systemText(opened.systemError));
+        return failToOpen(opened);
     }
     return writeInto(file, path, true);
 }

@@ -1,17 +1,16 @@
 #include "kddlib/Limits.h"
 #include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagfile/TagFileFrame.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/KxMsg.h"
 #include "platform/base/LogFile.h"
-#include "platform/base/Stopwatch.h"
 #include "platform/compression/LzmaCompress.h"
 #include "platform/compression/QxCompress.h"
 
 #include <QDataStream>
 
 #include <cstring>
-#include <limits>
 
 namespace Kdd
 {
@@ -19,22 +18,8 @@ namespace Kdd
 namespace
 {
 
-constexpr char kMagic[] = {'T', 'a', 'C', 'a'};
-constexpr quint8 kVersion = 0;
-constexpr quint8 kOldLayout = 1;
-constexpr quint8 kLayout = 2;
-
-constexpr int kBodyReservation = 0x20000;
 constexpr int kReadChunk = 0x40000;
 constexpr qint64 kMaxStoredBody = kMaxBodySize + kReadChunk;  // data that cannot be compressed grows a little
-constexpr int kFrameSize = 16;                                // header, body size and blob count
-constexpr int kBlobFrameSize = 4;
-
-// What the records of a body hold.
-constexpr quint8 kStudyRecord = 0;
-constexpr quint8 kSeriesRecord = 1;
-constexpr quint8 kImageRecord = 2;
-constexpr quint8 kVolumesRecord = 3;
 
 const char* const kIncorrectHeader = "Tag file has incorrect header";
 const char* const kUnsupportedVersion = "Tag file has unsupported version";
@@ -42,7 +27,6 @@ const char* const kTruncated = "Tag file seems to be truncated";
 const char* const kUnsupportedCompression = "Tag file has unsupported compression format";
 const char* const kDamaged = "Tag file has a damaged body";
 const char* const kNoStudy = "Tag file holds no readable study";
-const char* const kTooLarge = "Tag file would be larger than the format allows";
 
 struct Header
 {
@@ -84,19 +68,6 @@ QList<QByteArray> readBlobs(QDataStream& in, qint32& count)
     return blobs;
 }
 
-QByteArray compressed(const QByteArray& body, TagFile::CompressionMode mode)
-{
-    switch (mode) {
-    case TagFile::CompressionMode::Zlib:
-        return qxCompress(reinterpret_cast<const unsigned char*>(body.constData()), body.size());
-    case TagFile::CompressionMode::Lzma:
-        return lzmaCompress(body);
-    case TagFile::CompressionMode::None:
-        break;
-    }
-    return body;
-}
-
 /// False when the mode is none of ours; damage gives an empty body.
 bool uncompress(const QByteArray& stored, quint8 mode, QByteArray& body)
 {
@@ -114,85 +85,7 @@ bool uncompress(const QByteArray& stored, quint8 mode, QByteArray& body)
     return false;
 }
 
-qint64 totalSize(const QList<QByteArray>& blobs)
-{
-    qint64 total = 0;
-    for (const QByteArray& blob : blobs)
-        total += blob.size();
-    return total;
-}
-
-int asInt(qint64 value)
-{
-    return static_cast<int>(qMin<qint64>(value, std::numeric_limits<int>::max()));
-}
-
-void writeNode(KxMsg& body, quint8 marker, const TagMap& node, QList<QByteArray>& blobs)
-{
-    body << marker;
-    node.serialize(body, blobs);
-}
-
-/// The records of a study's tree; the number of volumes written.
-int writeStudy(KxMsg& body, const TagMap& study, QList<QByteArray>& blobs)
-{
-    int volumes = 0;
-    writeNode(body, kStudyRecord, study, blobs);
-    for (const TagMap* series : study.children()) {
-        writeNode(body, kSeriesRecord, *series, blobs);
-        for (const TagMap* image : series->children())
-            writeNode(body, kImageRecord, *image, blobs);
-        if (series->volumes().isEmpty())
-            continue;
-        body << kVolumesRecord;
-        series->serializeVolumes(body, blobs);
-        volumes += series->volumes().size();
-    }
-    return volumes;
-}
-
 }  // namespace
-
-bool TagFile::writeCacheFile(QDataStream& out)
-{
-    return write(out, sCompressionMode);
-}
-
-bool TagFile::write(QDataStream& out, CompressionMode mode)
-{
-    const Stopwatch stopwatch;
-    KxMsg body;
-    body.reserve(kBodyReservation);
-    QList<QByteArray> blobs;
-    mStatistics.volumes = 0;
-    for (const std::shared_ptr<TagMap>& study : qAsConst(mStudies)) {
-        study->relinkItems();
-        mStatistics.volumes += writeStudy(body, *study, blobs);
-    }
-    if (body.size() > kMaxBodySize)
-        return fail(QLatin1String(kTooLarge));
-    const QByteArray stored = compressed(body.bytes(), mode);
-    out.writeRawData(kMagic, sizeof kMagic);
-    out << kVersion << quint8(0) << kLayout << static_cast<quint8>(mode);
-    out << static_cast<qint32>(stored.size());
-    out.writeRawData(stored.constData(), stored.size());
-    out << static_cast<qint32>(blobs.size());
-    for (const QByteArray& blob : qAsConst(blobs))
-        out << blob;
-    recordSizes(stored.size(), body.size(), blobs);
-    mStatistics.writeMs = stopwatch.elapsed();
-    return true;
-}
-
-void TagFile::recordSizes(qint64 storedBody, qint64 body, const QList<QByteArray>& blobs)
-{
-    const qint64 blobBytes = totalSize(blobs);
-    const qint64 around = kFrameSize + qint64(kBlobFrameSize) * blobs.size() + blobBytes;
-    mStatistics.blobs = blobs.size();
-    mStatistics.blobBytes = asInt(blobBytes);
-    mStatistics.storedSize = asInt(storedBody + around);
-    mStatistics.uncompressedSize = asInt(body + around);
-}
 
 /// Puts the records of a body into the indexes and the tree of a tag file.
 class TagFile::BodyReader
@@ -303,6 +196,7 @@ private:
 
 bool TagFile::readCacheFile(QDataStream& in, const char* studyUID)
 {
+    const QByteArray wanted(studyUID);  // may be that of the study that is held and let go of now
     clear();
     Header header;
     if (in.readRawData(header.magic, sizeof header.magic) != int(sizeof header.magic) ||
@@ -332,7 +226,8 @@ bool TagFile::readCacheFile(QDataStream& in, const char* studyUID)
     if (mStatistics.missingBlobs > 0 && LogFile::debugLogging())
         LogFile::printf("%s ends early: %d of %d previews are missing", qUtf8Printable(mCacheFilePath),
                         mStatistics.missingBlobs, promised);
-    if (body.size() > kMaxBodySize || !BodyReader(*this, studyUID, blobs).read(KxMsg(body))) {
+    if (body.size() > kMaxBodySize ||
+        !BodyReader(*this, studyUID != nullptr ? wanted.constData() : nullptr, blobs).read(KxMsg(body))) {
         clear();
         return failReading(kDamaged);
     }
@@ -343,13 +238,6 @@ bool TagFile::failReading(const char* reason)
 {
     LogFile::errorf("%s", reason);
     return fail(QLatin1String(reason));
-}
-
-QByteArray TagFile::serialized(CompressionMode mode)
-{
-    QByteArray content;
-    QDataStream out(&content, QIODevice::WriteOnly);
-    return write(out, mode) ? content : QByteArray();
 }
 
 }  // namespace Kdd

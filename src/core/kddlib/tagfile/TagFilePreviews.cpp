@@ -209,18 +209,22 @@ bool TagFile::addPreview(TagMap* image, DcmDataset* dataset, const QString& path
     return true;
 }
 
-bool TagFile::addPreview(const QByteArray& sopInstanceUID, const QString& path)
+bool TagFile::addPreview(TagMap* image, const QByteArray& file)
 {
-    TagMap* image = findImage(sopInstanceUID);
     if (image == nullptr)
         return false;
-    DcmFileFormat file;
-    const OFCondition condition = loadDicomFile(QFile::encodeName(path).constData(), file);
+    DcmFileFormat format;
+    const OFCondition condition = loadDicomFile(file.constData(), format);
     if (condition.bad()) {
-        LogFile::warnf(kNotCreated, qUtf8Printable(path), condition.text());
+        LogFile::warnf(kNotCreated, file.constData(), condition.text());
         return false;
     }
-    return addPreview(image, file.getDataset(), path);
+    return addPreview(image, format.getDataset(), QFile::decodeName(file));
+}
+
+bool TagFile::addPreview(const QByteArray& sopInstanceUID, const QString& path)
+{
+    return addPreview(findImage(sopInstanceUID), QFile::encodeName(path));
 }
 
 bool TagFile::addPreview(DcmDataset* dataset, const QString& path)

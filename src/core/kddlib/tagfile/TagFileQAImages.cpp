@@ -118,7 +118,7 @@ bool TagFile::QAJob::note(Edit& edit)
         return failAt(edit.key, QStringLiteral("the audit logs become too long to be stored"));
     if (!log.store(edit.image))
         return failAt(edit.key, QStringLiteral("there is no private block left for its audit log"));
-    if (!mJob.timestamp.isEmpty() && !mJob.login.isEmpty())
+    if (!mJob.timestamp.trimmed().isEmpty() && !mJob.login.isEmpty())
         edit.image.putAndInsertValue(kAuditTime, kOurPrivateCreator, VrCode::DT, mJob.timestamp);
     ++mJob.outcome.changed;
     if (edit.hasChanged(DCM_PixelData) && edit.image.findElement(kPreview) != nullptr)
@@ -129,7 +129,7 @@ bool TagFile::QAJob::note(Edit& edit)
 /// A picture of what was corrected away is worse than none.
 void TagFile::QAJob::renewPreview(const Edit& edit)
 {
-    if (origin().addPreview(edit.key, QString::fromLocal8Bit(filePathOf(edit.image))))
+    if (origin().addPreview(origin().findImage(edit.key), filePathOf(edit.image)))
         return;
     edit.image.deleteElement(kPreview);
     if (edit.image.findElement(kPreview) != nullptr)

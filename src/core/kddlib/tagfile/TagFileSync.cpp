@@ -83,8 +83,10 @@ QVector<QByteArray> volumeNames(const TagMap& series)
 
 }  // namespace
 
-bool TagFile::readAndSync(const char* studyUID, const char* /*user*/)
+bool TagFile::readAndSync(const char* studyUIDGiven, const char* /*user*/)
 {
+    const QByteArray wanted(studyUIDGiven);  // may be that of the study that is held and let go of now
+    const char* studyUID = wanted.constData();
     Result result = Kxg::StorageManager::retrieveStorageVolumes();
     if (result.bad())
         LogFile::warnf("%s", qUtf8Printable(result.text()));
@@ -99,7 +101,7 @@ bool TagFile::readAndSync(const char* studyUID, const char* /*user*/)
         return false;
     }
     SeriesQuery query(studyUID);
-    const bool isRead = readCacheFileForStudy(studyUID, false);
+    const bool isRead = readWhenFreeForStudy(studyUID, false);
     QMap<QByteArray, std::shared_ptr<Kxg::SeriesInfo>> series;
     result = query.wait(series);
     if (!isRead) {

@@ -23,6 +23,8 @@ void writeRecord(KxMsg& out, Write write)
     const int start = out.position();
     out << quint16(0);
     write();
+    if (out.failed())
+        return;
     KxMsg length;
     TagMap::writeLength(length, out.position() - start - kShortLength);
     out.replace(start, kShortLength, length.bytes());
@@ -44,28 +46,8 @@ VrCode storedVr(const TagElement& element)
 {
     if (element.isSequence() && !element.markedAsMissing() && !element.markedAsOmitted())
         return VrCode::SQ;
-    return element.vr() == VrCode::SQ ? VrCode::UN : element.vr();
-}
-
-void writeElement(KxMsg& out, const DcmTagKey& key, const TagElement& element, QList<QByteArray>& blobs)
-{
-    if (key == kPreview && !element.markedAsMissing() && !element.markedAsOmitted()) {
-        writeKey(out, kPreviewIndex, VrCode::IS);
-        writeValue(out, QByteArray::number(blobs.size()));
-        blobs.append(element.value());
-        return;
-    }
-    writeKey(out, key, storedVr(element));
-    if (element.markedAsMissing() || element.markedAsOmitted())
-        return;
-    if (!element.isSequence()) {
-        writeValue(out, element.value());
-        return;
-    }
-    const auto& sequence = static_cast<const TagSequence&>(element);
-    TagMap::writeLength(out, sequence.numItems());
-    for (int i = 0; i < sequence.numItems(); ++i)
-        sequence.item(i)->serialize(out, blobs);
+    const bool fits = static_cast<quint32>(element.vr()) <= static_cast<quint32>(VrCode::Omitted);
+    return element.vr() == VrCode::SQ || !fits ? VrCode::UN : element.vr();
 }
 
 /// The preview that an index element stands for; null when the table has no such entry.
@@ -101,10 +83,60 @@ int TagMap::readLength(KxMsg& in)
 
 void TagMap::serialize(KxMsg& out, QList<QByteArray>& blobs) const
 {
+    WriteContext context{blobs, kMaxElements, 0, nullptr};
+    serialize(out, context);
+}
+
+/// Counts as the reader does.
+void TagMap::serialize(KxMsg& out, WriteContext& context) const
+{
+    context.elementsLeft -= 1 + mTags.size();
+    if (context.elementsLeft < 0) {
+        refuse(out, context, "Tag file would hold more nodes, items and values than the format allows");
+        return;
+    }
     writeRecord(out, [&] {
-        for (auto it = mTags.cbegin(); it != mTags.cend(); ++it)
-            writeElement(out, it.key(), *it.value(), blobs);
+        for (auto it = mTags.cbegin(); it != mTags.cend() && !out.failed(); ++it)
+            writeElement(out, it.key(), *it.value(), context);
     });
+}
+
+void TagMap::refuse(KxMsg& out, WriteContext& context, const char* reason)
+{
+    context.refusal = reason;
+    out.setFailed();
+}
+
+void TagMap::writeElement(KxMsg& out, const DcmTagKey& key, const TagElement& element, WriteContext& context)
+{
+    if (key == kPreview && !element.markedAsMissing() && !element.markedAsOmitted()) {
+        writeKey(out, kPreviewIndex, VrCode::IS);
+        writeValue(out, QByteArray::number(context.blobs.size()));
+        context.blobs.append(element.value());
+        return;
+    }
+    // Before it is appended: a message can hold no more than a little above the bound.
+    if (qint64(out.position()) + element.value().size() > kMaxBodySize) {
+        refuse(out, context, "Tag file would be larger than the format allows");
+        return;
+    }
+    writeKey(out, key, storedVr(element));
+    if (element.markedAsMissing() || element.markedAsOmitted())
+        return;
+    if (!element.isSequence()) {
+        writeValue(out, element.value());
+        return;
+    }
+    if (context.depth >= kMaxItemDepth) {
+        refuse(out, context, "Tag file would nest sequence items deeper than the format allows");
+        return;
+    }
+    const auto& sequence = static_cast<const TagSequence&>(element);
+    writeLength(out, sequence.numItems());
+    ++context.depth;
+    for (int i = 0; i < sequence.numItems() && !out.failed(); ++i)
+        sequence.itemToRead(i).serialize(out, context);
+    --context.depth;
 }
 
 void TagMap::deserialize(KxMsg& in, TagMap* parent, const QList<QByteArray>& blobs)
@@ -167,7 +199,6 @@ std::unique_ptr<TagElement> TagMap::readSequence(KxMsg& in, const DcmTagKey& key
             sequenceAbove != nullptr && i < sequenceAbove->numItems() ? sequenceAbove->item(i) : nullptr;
         auto* item = new TagMap;
         sequence->addItem(item);
-        item->mIsSequenceItem = true;
         const int length = readLength(in);
         KxMsg record = in.readMessage(length);
         item->deserialize(record, itemAbove, context);

@@ -282,6 +282,14 @@ bool findImages(const TagMap& series, ImagesByVolume& found)
     return true;
 }
 
+/// Whether `findImages` would find too many. Few images cannot name that many volumes, so they are not looked at.
+bool namesTooManyImages(const TagMap& series)
+{
+    ImagesByVolume unused;
+    return qint64(series.children().size()) * (kMaxByte + 1) > kMaxVolumeImages &&
+           !findImages(series, unused);
+}
+
 /// What the images of a series say about a volume.
 struct VolumeImages
 {
@@ -332,10 +340,19 @@ std::vector<std::unique_ptr<Volume>> readVolumes(KxMsg& in, const QList<QByteArr
 
 void TagMap::serializeVolumes(KxMsg& out, QList<QByteArray>& blobs) const
 {
+    if (namesTooManyImages(*this)) {
+        out.setFailed();
+        return;
+    }
     KxMsg list;
     writeLength(list, mVolumes.size());
-    for (const Volume* volume : mVolumes)
+    for (const Volume* volume : mVolumes) {
         volume->serialize(list, blobs);
+        if (list.size() > kMaxBodySize) {
+            out.setFailed();
+            return;
+        }
+    }
     writeLength(out, list.size());
     out.write(list.bytes());
 }

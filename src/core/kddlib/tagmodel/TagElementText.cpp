@@ -1,4 +1,5 @@
 #include "kddlib/tagmodel/TagElement.h"
+#include "platform/base/Decimal.h"
 #include "platform/base/Tokenizer.h"
 
 #include <QtEndian>
@@ -186,8 +187,7 @@ bool TagElement::putValueAsString(const QByteArray& text)
         mValue = text;
         return true;
     }
-    const auto toFloat = [](const char* word) { return static_cast<float>(std::strtod(word, nullptr)); };
-    const auto toDouble = [](const char* word) { return std::strtod(word, nullptr); };
+    const auto toFloat = [](const char* word) { return static_cast<float>(decimalNumber(word)); };
     const auto toInt32 = [](const char* word) { return static_cast<qint32>(std::strtol(word, nullptr, 10)); };
     const auto toInt16 = [](const char* word) { return static_cast<qint16>(std::strtol(word, nullptr, 10)); };
     const auto toUint32 = [](const char* word) {
@@ -202,7 +202,7 @@ bool TagElement::putValueAsString(const QByteArray& text)
         mValue = numbersFromWords(text, toFloat);
         return true;
     case VrCode::FD:
-        mValue = numbersFromWords(text, toDouble);
+        mValue = numbersFromWords(text, decimalNumber);
         return true;
     case VrCode::SL:
         mValue = numbersFromWords(text, toInt32);

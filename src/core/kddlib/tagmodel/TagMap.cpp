@@ -135,7 +135,7 @@ bool TagMap::findAndGetString(const DcmTagKey& key, const char* creator, QByteAr
 TagElement* TagMap::putElement(const DcmTagKey& key, TagElement* element)
 {
     TagElement*& place = mTags[key];
-    delete place;
+    const std::unique_ptr<TagElement> replaced(place != element ? place : nullptr);
     place = element;
     return element;
 }
@@ -171,8 +171,9 @@ TagElement* TagMap::markAsOmitted(const DcmTagKey& key)
 
 bool TagMap::putAndInsertInt(const DcmTagKey& key, int value)
 {
-    TagElement* element = plainElement(key);
-    element->putValue(value);
+    if (holdsSequence(key))
+        return false;
+    plainElement(key)->putValue(value);
     return true;
 }
 
@@ -183,17 +184,22 @@ bool TagMap::putAndInsertString(const DcmTagKey& key, const QByteArray& text)
 
 bool TagMap::putAndInsertString(const DcmTagKey& key, const char* creator, const QByteArray& text)
 {
-    const TagElement* existing = ownElement(key);
-    const bool isNew = existing == nullptr || existing->markedAsMissing() || existing->markedAsOmitted();
-    TagElement* element = plainElement(key);
-    if (isNew)
-        element->setVr(dictionaryVr(key, creator));
-    element->putValueAsString(text);
+    TagElement* element = ownElement(key);
+    if (element == nullptr || element->markedAsMissing() || element->markedAsOmitted()) {
+        // A new one, because the bytes that a marker hides must not come to light where the VR takes no text.
+        auto made = std::make_unique<TagElement>(dictionaryVr(key, creator), QByteArray());
+        made->putValueAsString(text);
+        putElement(key, made.release());
+    } else {
+        element->putValueAsString(text);
+    }
     return true;
 }
 
 bool TagMap::putAndInsertValue(const DcmTagKey& key, VrCode vr, const QByteArray& bytes)
 {
+    if (holdsSequence(key))
+        return false;
     TagElement* element = plainElement(key);
     element->putValue(bytes);
     element->setVr(vr);
@@ -209,10 +215,18 @@ bool TagMap::putAndInsertValue(const DcmTagKey& key, const char* creator, VrCode
     const CreatorSearch search = findCreator(*this, key, creator);
     if (search.found != 0)
         return putAndInsertValue(inBlock(key, search.found), vr, bytes);
-    if (search.free > kLastBlock)
+    const DcmTagKey target = inBlock(key, search.free);
+    if (search.free > kLastBlock || holdsSequence(target) || holdsSequence(creatorKey(key, search.free)))
         return false;
+    const QByteArray given = bytes;  // it may be what stands in the creator's place, hidden by a marker
     putAndInsertValue(creatorKey(key, search.free), VrCode::LO, QByteArray(creator));
-    return putAndInsertValue(inBlock(key, search.free), vr, bytes);
+    return putAndInsertValue(target, vr, given);
+}
+
+bool TagMap::holdsSequence(const DcmTagKey& key) const
+{
+    const TagElement* own = ownElement(key);
+    return own != nullptr && own->isSequence() && !own->markedAsMissing() && !own->markedAsOmitted();
 }
 
 TagElement* TagMap::plainElement(const DcmTagKey& key)

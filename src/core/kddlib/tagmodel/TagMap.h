@@ -73,11 +73,13 @@ public:
 
     /// Attaches `child` and takes it over (an item stays with its sequence). What the child shares with this node is
     /// dropped from the child, what it lacks is marked missing in it; a first child gives all it has to this node.
-    /// What every node shows stays the same. The UID element of `level` stays in the child.
+    /// What every node shows stays the same. The UID element of `level` stays in the child. A child that hangs elsewhere
+    /// leaves its parent with all it shows; one that hangs here already stays as it is.
     void addChildMap(TagMap* child, Level level);
 
     /// Takes the pointer out of the children; false if it is not there. The child is neither deleted nor changed: its
-    /// parent pointer stays and what it inherited is not copied back. The caller owns it.
+    /// parent pointer stays and what it inherited is not copied back. The caller owns it, and asks it for nothing once
+    /// the parent is gone.
     bool removeChildMap(TagMap* child);
 
     /// A deep copy of the merged view: no parent, no children, no volumes. The caller owns it.
@@ -100,10 +102,12 @@ public:
     /// set's original transfer syntax, if it has one, becomes the one byte of (0006,7102).
     static TagMap* createTagMap(DcmItem* item, unsigned int maxLength);
 
-    /// Copies one DCMTK element into the own map. Its value stays as it was when DCMTK cannot give it.
+    /// Copies one DCMTK element into the own map. Its value stays as it was when DCMTK cannot give it, a sequence that
+    /// the key holds as a whole.
     TagElement* setElement(DcmElement* element);
 
-    /// Copies one DCMTK sequence into the own map, in place of the items of an earlier one.
+    /// Copies one DCMTK sequence into the own map. A sequence that the key holds already gets the new items in place of
+    /// its own.
     TagSequence* setSequence(DcmSequenceOfItems* sequence, unsigned int maxLength);
 
     /// Inserts the merged view into a DCMTK item, without what is missing or omitted.
@@ -138,23 +142,26 @@ public:
     bool findAndGetString(const DcmTagKey& key, QByteArray& text) const;
     bool findAndGetString(const DcmTagKey& key, const char* creator, QByteArray& text) const;
 
-    // ---- change; all of them work on the own map
+    // ---- change; all of them work on the own map. What is given may be part of this tree, also of what is replaced.
 
-    /// Stores a number; its size decides the VR.
+    /// Stores a number; its size decides the VR. False, and nothing changed, when the key holds a sequence: its items
+    /// would be lost for a value that cannot mean them. Whoever wants that deletes the element first.
     bool putAndInsertInt(const DcmTagKey& key, int value);
 
     /// Stores a text in the encoding of the element's VR; a new element, or a marker, takes its VR from the
-    /// dictionary (UN when it knows none). Always true.
+    /// dictionary (UN when it knows none). Always true, also where `TagElement::putValueAsString` refuses the VR and
+    /// the element, a sequence for example, stays as it was.
     bool putAndInsertString(const DcmTagKey& key, const QByteArray& text);
     bool putAndInsertString(const DcmTagKey& key, const char* creator, const QByteArray& text);
 
+    /// Stores bytes and their VR. False, and nothing changed, when the key holds a sequence, as for a number.
     bool putAndInsertValue(const DcmTagKey& key, VrCode vr, const QByteArray& bytes);
 
-    /// Stores a private value in the creator's block, which is reserved when it is new. False for an even group and
-    /// when no block is free.
+    /// Stores a private value in the creator's block, which is reserved when it is new. False, and nothing changed, for
+    /// an even group, when no block is free and when a sequence stands in the value's place.
     bool putAndInsertValue(const DcmTagKey& key, const char* creator, VrCode vr, const QByteArray& bytes);
 
-    /// Puts an element of its own under the key in place of an earlier one, and takes it over.
+    /// Puts an element of its own under the key in place of an earlier one, be it a sequence, and takes it over.
     TagElement* putElement(const DcmTagKey& key, TagElement* element);
 
     bool deleteElement(const DcmTagKey& key);
@@ -181,8 +188,9 @@ public:
     /// Every child holds its own value, this node none.
     void storeOptionA(const DcmTagKey& key);
 
-    /// This node holds the value, children only what differs. Children are compared by their bytes.
-    void storeOptionB(const DcmTagKey& key, VrCode vr, const QByteArray& value);
+    /// This node holds the value, children only what differs. Children are compared by their bytes; a sequence equals
+    /// no value. By value, because it may be that of a child that loses it.
+    void storeOptionB(const DcmTagKey& key, VrCode vr, QByteArray value);
 
     /// Deletes what clients never use (values of VR UN, look-up tables, overlays, all but four items of the Original
     /// Attributes Sequence, the suffixes of volume files), here and below.
@@ -215,13 +223,16 @@ public:
 
     // ---- tag file records
 
-    /// Appends the node's own elements as one record with its length. Previews go to `blobs`.
+    /// Appends the node's own elements as one record with its length. Previews go to `blobs`. The message has failed
+    /// afterwards when the node holds more, or nests deeper, than `deserialize` reads.
     void serialize(KxMsg& out, QList<QByteArray>& blobs) const;
 
     /// Reads elements until the message is used up; `parent` is the node that this map will hang under. The message
     /// has failed afterwards when it was damaged; the map then holds what was read before.
     void deserialize(KxMsg& in, TagMap* parent, const QList<QByteArray>& blobs);
 
+    /// Appends the volumes as one record. The message has failed afterwards when they name more images than
+    /// `deserializeVolumes` reads.
     void serializeVolumes(KxMsg& out, QList<QByteArray>& blobs) const;
     void deserializeVolumes(KxMsg& in, const QList<QByteArray>& blobs);
 
@@ -231,6 +242,7 @@ public:
 
 protected:
     friend class TagFile;
+    friend class TagSequence;
 
     void insertUID(Level level, TagElement* uid);
     TagElement* removeUID(Level level);
@@ -249,6 +261,10 @@ private:
     void addSequence(DcmSequenceOfItems& sequence, unsigned int maxLength, int depth);
     void addElement(DcmElement& element, unsigned int maxLength);
 
+    /// What a sequence appends for this map: the map itself, or a copy when it is another sequence's already.
+    TagMap* becomeItem();
+    bool hangs() const { return mParent != nullptr && !mIsTakenOut; }
+
     void adoptFrom(TagMap* child);
     void dropWhatParentShows(const TagMap& parent);
     static void attachItems(const TagSequence& parentSequence, const TagSequence& childSequence);
@@ -261,11 +277,12 @@ private:
     void releaseAll();
 
     TagElement* ownElement(const DcmTagKey& key) const { return mTags.value(key, nullptr); }
+    bool holdsSequence(const DcmTagKey& key) const;
     TagElement* plainElement(const DcmTagKey& key);
     void putInOrder(const DcmTagKey& key, TagElement* element);
 
     static bool equals(const TagElement& element, VrCode vr, const QByteArray& value, Match match);
-    void storeHere(const DcmTagKey& key, VrCode vr, const QByteArray& value, Match match);
+    void storeHere(const DcmTagKey& key, VrCode vr, QByteArray value, Match match);
     void place(const DcmTagKey& key, const Elements& held);
     void forgetUnseen(const DcmTagKey& key, bool childrenAreMarked);
 
@@ -277,6 +294,19 @@ private:
         int depth;
     };
 
+    /// What the writing of one tag file's records shares: what may still be written, and why it may not.
+    struct WriteContext
+    {
+        QList<QByteArray>& blobs;
+        int elementsLeft;
+        int depth;
+        const char* refusal;
+    };
+
+    void serialize(KxMsg& out, WriteContext& context) const;
+    static void writeElement(KxMsg& out, const DcmTagKey& key, const TagElement& element,
+                             WriteContext& context);
+    static void refuse(KxMsg& out, WriteContext& context, const char* reason);
     void deserialize(KxMsg& in, TagMap* parent, RecordContext& context);
     static std::unique_ptr<TagElement> readSequence(KxMsg& in, const DcmTagKey& key, const TagMap* parent,
                                                     RecordContext& context);
@@ -286,6 +316,8 @@ private:
     QList<Volume*> mVolumes;
     Tags mTags;
     bool mIsSequenceItem = false;
+    bool mIsInSequence = false;  // an item may also be the copy of one, which belongs to no sequence
+    bool mIsTakenOut = false;    // no child of `mParent` any more
     bool mOwns = true;
 };
 

@@ -163,10 +163,18 @@ void TagMap::addElement(DcmElement& element, unsigned int maxLength)
 
 TagElement* TagMap::setElement(DcmElement* element)
 {
-    TagElement* copy = plainElement(DcmTagKey(element->getGTag(), element->getETag()));
+    const DcmTagKey key(element->getGTag(), element->getETag());
+    TagElement* held = ownElement(key);
+    auto copy = std::make_unique<TagElement>(VrCode::UN, held != nullptr ? held->value() : QByteArray());
     // NOLINTNEXTLINE(clang-analyzer-unix.Malloc): a condition frees the text it owns
-    copyValue(*element, *copy);
-    return copy;
+    const OFCondition condition = copyValue(*element, *copy);
+    if (held == nullptr || (held->isSequence() && condition.good()))
+        return putElement(key, copy.release());
+    if (!held->isSequence()) {
+        held->putValue(copy->value());
+        held->setVr(copy->vr());
+    }
+    return held;
 }
 
 TagSequence* TagMap::setSequence(DcmSequenceOfItems* sequence, unsigned int maxLength)
@@ -180,12 +188,16 @@ TagSequence* TagMap::setSequence(DcmSequenceOfItems* sequence, unsigned int maxL
     // Stepping from item to item: looking items up by number would start at the head of DCMTK's list each time.
     for (DcmObject* object = sequence->nextInContainer(nullptr); object != nullptr;
          object = sequence->nextInContainer(object)) {
-        TagMap* map = createTagMap(static_cast<DcmItem*>(object), maxLength, depth + 1);
-        map->mIsSequenceItem = true;
-        copy->addItem(map);
+        copy->addItem(createTagMap(static_cast<DcmItem*>(object), maxLength, depth + 1));
+    }
+    const DcmTagKey key(sequence->getTag());
+    if (holdsSequence(key)) {
+        auto* held = static_cast<TagSequence*>(ownElement(key));
+        held->swapItems(*copy);
+        return held;
     }
     TagSequence* put = copy.get();
-    putInOrder(sequence->getTag(), copy.release());
+    putInOrder(key, copy.release());
     return put;
 }
 

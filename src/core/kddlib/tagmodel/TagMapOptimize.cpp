@@ -5,6 +5,7 @@
 
 #include <cstring>
 #include <unordered_map>
+#include <utility>
 #include <vector>
 
 namespace Kdd
@@ -144,6 +145,12 @@ bool isNeededByClient(const DcmTagKey& key, const TagElement& element)
            key != DCM_ModalityLUTSequence && !isOverlayData(key);
 }
 
+/// A key of the caller's may stand in a map that loses the entry meanwhile.
+DcmTagKey ownKey(const DcmTagKey& key)
+{
+    return {key.getGroup(), key.getElement()};
+}
+
 quint32 packed(const DcmTagKey& key)
 {
     return static_cast<quint32>(key.getGroup()) << 16 | key.getElement();
@@ -163,7 +170,7 @@ void TagMap::optimize(const DcmTagKey& key)
         if (const TagElement* own = child->ownElement(key))
             held.push_back(own);
     }
-    place(key, held);
+    place(ownKey(key), held);
 }
 
 /// Keys do not influence each other, so one walk over the children finds what they hold for all of them: looking
@@ -216,8 +223,9 @@ void TagMap::forgetUnseen(const DcmTagKey& key, bool childrenAreMarked)
         child->deleteElement(key);
 }
 
-void TagMap::storeOptionA(const DcmTagKey& key)
+void TagMap::storeOptionA(const DcmTagKey& keyGiven)
 {
+    const DcmTagKey key = ownKey(keyGiven);
     const TagElement* shown = findElement(key);
     for (TagMap* child : qAsConst(mChildren)) {
         const TagElement* own = child->ownElement(key);
@@ -237,16 +245,17 @@ void TagMap::storeOptionA(const DcmTagKey& key)
         markAsMissing(key);
 }
 
-void TagMap::storeOptionB(const DcmTagKey& key, VrCode vr, const QByteArray& value)
+void TagMap::storeOptionB(const DcmTagKey& key, VrCode vr, QByteArray value)
 {
-    storeHere(key, vr, value, Match::Bytes);
+    storeHere(ownKey(key), vr, std::move(value), Match::Bytes);
 }
 
 /// Whether `element` may be dropped in favour of the value. With `BytesAndVr` a child never changes what it shows:
 /// the same two bytes are another number as US than as SS.
 bool TagMap::equals(const TagElement& element, VrCode vr, const QByteArray& value, Match match)
 {
-    if (element.value() != value)
+    // A sequence has no bytes either, but items.
+    if (element.isSequence() || element.value() != value)
         return false;
     // An omitted value has no bytes either, but it is not empty.
     return match == Match::BytesAndVr || element.markedAsOmitted() || vr == VrCode::Omitted
@@ -254,7 +263,7 @@ bool TagMap::equals(const TagElement& element, VrCode vr, const QByteArray& valu
                : true;
 }
 
-void TagMap::storeHere(const DcmTagKey& key, VrCode vr, const QByteArray& value, Match match)
+void TagMap::storeHere(const DcmTagKey& key, VrCode vr, QByteArray value, Match match)
 {
     const TagElement* shown = findElement(key);
     for (TagMap* child : qAsConst(mChildren)) {
@@ -268,7 +277,9 @@ void TagMap::storeHere(const DcmTagKey& key, VrCode vr, const QByteArray& value,
             child->putElement(key, shown->clone());
         }
     }
-    putAndInsertValue(key, vr, value);
+    TagElement* here = plainElement(key);
+    here->value() = std::move(value);
+    here->setVr(vr);
 }
 
 void TagMap::removeTagsNotNeededByClient()

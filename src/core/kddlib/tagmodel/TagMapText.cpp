@@ -72,9 +72,9 @@ private:
         for (int i = 0; i < sequence.numItems(); ++i) {
             mOut << blanks(2) << "(fffe,e000)\n";
             if (&mLayout == &kDump)
-                sequence.item(i)->dump(mOut, mIndent + 4);
+                sequence.itemToRead(i).dump(mOut, mIndent + 4);
             else
-                sequence.item(i)->listContent(mOut, mIndent + 4);
+                sequence.itemToRead(i).listContent(mOut, mIndent + 4);
             mOut << blanks(2) << "(fffe,e00d)\n";
         }
         mOut << blanks(0) << "(fffe,e0dd)\n";

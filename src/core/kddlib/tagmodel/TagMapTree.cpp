@@ -43,12 +43,17 @@ TagMap::TagMap(const TagMap& other)
     , mVolumes(other.mVolumes)
     , mTags(other.mTags)
     , mIsSequenceItem(other.mIsSequenceItem)
+    , mIsTakenOut(true)
     , mOwns(false)
 {
 }
 
 TagMap& TagMap::operator=(const TagMap& other)
 {
+    // A copy that is assigned back brings what is here; that stays with whom it belongs to.
+    const bool isEmpty = mTags.isEmpty() && mChildren.isEmpty() && mVolumes.isEmpty();
+    if (!isEmpty && mTags == other.mTags && mChildren == other.mChildren && mVolumes == other.mVolumes)
+        return *this;
     if (this == &other)
         return *this;
     if (mOwns)
@@ -58,6 +63,7 @@ TagMap& TagMap::operator=(const TagMap& other)
     mVolumes = other.mVolumes;
     mTags = other.mTags;
     mIsSequenceItem = other.mIsSequenceItem;
+    mIsTakenOut = true;
     mOwns = false;
     return *this;
 }
@@ -91,10 +97,10 @@ void TagMap::releaseAll()
 /// In constant time for the first and the last child, so that taking all children away one by one is linear.
 void TagMap::forgetParent()
 {
-    if (mParent == nullptr)
-        return;
-    mParent->removeChildMap(this);
+    if (hangs())
+        mParent->removeChildMap(this);
     mParent = nullptr;
+    mIsTakenOut = false;
 }
 
 bool TagMap::removeChildMap(TagMap* child)
@@ -102,15 +108,14 @@ bool TagMap::removeChildMap(TagMap* child)
     if (mChildren.isEmpty())
         return false;
     forgetInVolumes(child);
-    if (mChildren.first() == child) {
+    if (mChildren.first() == child)
         mChildren.removeFirst();
-        return true;
-    }
-    if (mChildren.last() == child) {
+    else if (mChildren.last() == child)
         mChildren.removeLast();
-        return true;
-    }
-    return mChildren.removeOne(child);
+    else if (!mChildren.removeOne(child))
+        return false;
+    child->mIsTakenOut = true;
+    return true;
 }
 
 TagElement* TagMap::removeUID(Level level)
@@ -140,6 +145,11 @@ QByteArray TagMap::uid(Level level) const
 
 void TagMap::addChildMap(TagMap* child, Level level)
 {
+    if (child->hangs()) {
+        if (child->mParent == this)
+            return;
+        child->standAlone();
+    }
     TagElement* uid = child->removeUID(level);
     if (mChildren.isEmpty() && !mIsSequenceItem)
         adoptFrom(child);
@@ -148,6 +158,19 @@ void TagMap::addChildMap(TagMap* child, Level level)
     child->insertUID(level, uid);
     mChildren.append(child);
     child->mParent = this;
+    child->mIsTakenOut = false;
+}
+
+/// An item below another item stays there and inherits; a node that others own can only be had whole.
+TagMap* TagMap::becomeItem()
+{
+    if (mIsInSequence)
+        return clone()->becomeItem();
+    if (hangs() && !mParent->mIsSequenceItem)
+        standAlone();
+    mIsSequenceItem = true;
+    mIsInSequence = true;
+    return this;
 }
 
 void TagMap::adoptFrom(TagMap* child)
@@ -187,8 +210,12 @@ void TagMap::dropWhatParentShows(const TagMap& parent)
 void TagMap::attachItems(const TagSequence& parentSequence, const TagSequence& childSequence)
 {
     for (int i = 0; i < qMin(parentSequence.numItems(), childSequence.numItems()); ++i) {
-        childSequence.item(i)->standAlone();
-        parentSequence.item(i)->addChildMap(childSequence.item(i), ItemLevel);
+        TagMap* above = parentSequence.item(i);
+        TagMap* item = childSequence.item(i);
+        if (above == nullptr || item == nullptr)
+            continue;
+        item->standAlone();
+        above->addChildMap(item, ItemLevel);
     }
 }
 
@@ -217,8 +244,10 @@ void TagMap::detachItems()
 {
     for (TagElement* element : qAsConst(mTags)) {
         const TagSequence* sequence = asSequence(element);
-        for (int i = 0; sequence != nullptr && i < sequence->numItems(); ++i)
-            sequence->item(i)->standAlone();
+        for (int i = 0; sequence != nullptr && i < sequence->numItems(); ++i) {
+            if (TagMap* item = sequence->item(i))
+                item->standAlone();
+        }
     }
 }
 
@@ -259,6 +288,8 @@ void TagMap::relinkOwnItems()
         const TagSequence* above = mParent != nullptr ? asSequence(mParent->findElement(it.key())) : nullptr;
         for (int i = 0; i < sequence->numItems(); ++i) {
             TagMap* item = sequence->item(i);
+            if (item == nullptr)
+                continue;
             item->hangBelow(above != nullptr && i < above->numItems() ? above->item(i) : nullptr);
             item->relinkOwnItems();
         }
@@ -267,7 +298,7 @@ void TagMap::relinkOwnItems()
 
 void TagMap::hangBelow(TagMap* item)
 {
-    if (mParent == item)
+    if (mParent == item && !mIsTakenOut)
         return;
     standAlone();
     if (item != nullptr)

@@ -5,49 +5,59 @@
 #include <dcmtk/dcmdata/dcitem.h>
 #include <dcmtk/dcmdata/dcsequen.h>
 
+#include <utility>
+
 namespace Kdd
 {
 
 TagSequence::TagSequence(const TagSequence& other)
     : TagElement(other)
     , mItems(other.mItems)
-    , mOwnsItems(false)
+    , mShared(other.mItems.size())
 {
 }
 
 TagSequence& TagSequence::operator=(const TagSequence& other)
 {
-    if (this == &other)
-        return *this;
-    release();
     TagElement::operator=(other);
+    // A copy that is assigned back brings the items that are here; they stay with whom they belong to.
+    if (mItems == other.mItems)
+        return *this;
+    clear();
     mItems = other.mItems;
-    mOwnsItems = false;
+    mShared = mItems.size();
     return *this;
 }
 
 TagSequence::~TagSequence()
 {
-    release();
+    clear();
 }
 
-void TagSequence::release()
+void TagSequence::addItem(TagMap* item)
 {
-    if (mOwnsItems)
-        qDeleteAll(mItems);
-    mItems.clear();
+    mItems.append(item != nullptr ? item->becomeItem() : nullptr);
 }
 
-void TagSequence::clear()
+const TagMap& TagSequence::itemToRead(int i) const
 {
-    release();
-    mOwnsItems = true;
+    static const TagMap empty;
+    const TagMap* map = item(i);
+    return map != nullptr ? *map : empty;
 }
 
 void TagSequence::truncate(int count)
 {
-    while (mItems.size() > count)
-        delete mItems.takeLast();
+    const QList<TagMap*> gone = mItems.mid(qMax(count, mShared));
+    mItems = mItems.mid(0, count);
+    mShared = qMin(mShared, mItems.size());
+    qDeleteAll(gone);
+}
+
+void TagSequence::swapItems(TagSequence& other)
+{
+    mItems.swap(other.mItems);
+    std::swap(mShared, other.mShared);
 }
 
 bool TagSequence::compare(const TagElement& other, bool checkVR, std::string* diffs) const
@@ -69,9 +79,9 @@ bool TagSequence::compare(const TagElement& other, bool checkVR, std::string* di
 DcmElement* TagSequence::createDcmElement(const DcmTagKey& key) const
 {
     auto sequence = std::make_unique<DcmSequenceOfItems>(tagFor(key));
-    for (const TagMap* map : mItems) {
+    for (int i = 0; i < numItems(); ++i) {
         auto item = std::make_unique<DcmItem>();
-        map->insertInto(*item);
+        itemToRead(i).insertInto(*item);
         sequence->append(item.release());
     }
     return sequence.release();
@@ -83,7 +93,7 @@ TagElement* TagSequence::clone() const
     copy->putValue(value());
     copy->setVr(vr());
     for (TagMap* map : mItems)
-        copy->addItem(map->clone());
+        copy->addItem(map != nullptr ? map->clone() : nullptr);
     return copy.release();
 }
 

@@ -12,7 +12,8 @@ class TagMap;
 /// A sequence attribute: an ordered list of item maps. VR SQ, no value bytes of its own.
 ///
 /// Owns its items. A copy made by construction or assignment shares the items without owning them, so it must not
-/// outlive its source; `clone()` is the deep copy.
+/// outlive its source, nor what its source does to them; what is added to the copy is the copy's own. `clone()` is the
+/// deep copy.
 class KDD_EXPORT TagSequence : public TagElement
 {
 public:
@@ -33,25 +34,32 @@ public:
     TagElement* clone() const override;
     bool isSequence() const override { return true; }
 
-    /// Appends the item and takes it over.
-    void addItem(TagMap* item) { mItems.append(item); }
+    /// Appends the item and takes it over: from now on it is an item, and goes with the sequence. One that belongs to a
+    /// sequence already is not taken from it, a copy is appended; one that hangs below a node that owns it takes along
+    /// all it shows. Null stands for an item that is not there.
+    void addItem(TagMap* item);
 
     int numItems() const { return mItems.size(); }
 
-    /// Owned by the sequence; 0 <= i < numItems().
+    /// Owned by the sequence; 0 <= i < numItems(). Null only where null was added.
     TagMap* item(int i) const { return mItems.at(i); }
 
-    /// Deletes every item.
-    void clear();
+    /// The same, an empty map for an item that is not there.
+    const TagMap& itemToRead(int i) const;
 
-    /// Deletes the items after the first `count`.
+    /// Deletes every item; a copy only lets go of those that it shares.
+    void clear() { truncate(0); }
+
+    /// The same for the items after the first `count`.
     void truncate(int count);
 
 private:
-    void release();
+    friend class TagMap;
+
+    void swapItems(TagSequence& other);
 
     QList<TagMap*> mItems;
-    bool mOwnsItems = true;
+    int mShared = 0;  // of the items, that many at the head belong to another sequence
 };
 
 }  // namespace Kdd

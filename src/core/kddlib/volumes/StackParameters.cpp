@@ -10,6 +10,7 @@
 
 #include <dcmtk/dcmdata/dcdeftag.h>
 
+#include <algorithm>
 #include <cmath>
 #include <cstdio>
 #include <string>
@@ -106,11 +107,22 @@ void insertAttribute(ParamBundle& bundle, const TagMap& image, const DcmTagKey& 
         bundle.insert(nameOf(key), Parameter::ofText(QByteArray(vrName(element->vr())) + ':' + text));
 }
 
-ParamBundle dicomBundle(const StackFrame& slice)
+/// False when it was ignored: then that of one slice says nothing of the volume.
+bool sharesFrameOfReference(const QVector<StackFrame>& slices)
 {
+    return std::all_of(slices.begin(), slices.end(), [&](const StackFrame& slice) {
+        return slice.frameOfReference == slices.first().frameOfReference;
+    });
+}
+
+ParamBundle dicomBundle(const QVector<StackFrame>& slices)
+{
+    const StackFrame& slice = slices.first();
     ParamBundle bundle;
-    for (const DcmTagKey& key : kImageAttributes)
-        insertAttribute(bundle, slice.tags.image(), key);
+    for (const DcmTagKey& key : kImageAttributes) {
+        if (key != DCM_FrameOfReferenceUID || sharesFrameOfReference(slices))
+            insertAttribute(bundle, slice.tags.image(), key);
+    }
     for (const FrameText& entry : kFrameTexts) {
         const QByteArray text = slice.tags.text(entry.group, entry.key);
         if (!text.isEmpty())
@@ -223,7 +235,7 @@ ParamBundle stackParameters(const Stack& stack, const StackValues& values, const
     insertValues(parameters, values, counts);
     insertCounts(parameters, stack.slices);
     insertWindow(parameters, stack.slices.at(stack.slices.size() / 2), values);
-    parameters.insertBundle("DICOM", dicomBundle(stack.slices.first()));
+    parameters.insertBundle("DICOM", dicomBundle(stack.slices));
     parameters.insertBundle("SOPInstanceUIDs", sopInstances(stack.slices));
     return parameters;
 }

@@ -3,6 +3,8 @@
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/StackSplit.h"
 
+#include <QHash>
+
 #include <dcmtk/dcmdata/dcdeftag.h>
 
 #include <algorithm>
@@ -60,9 +62,9 @@ bool isNear(double a, double b)
 bool areOfOneKind(const StackFrame& a, const StackFrame& b)
 {
     return a.columns == b.columns && a.rows == b.rows && a.isMultiFrame == b.isMultiFrame &&
-           a.photometric == b.photometric && a.frameOfReference == b.frameOfReference &&
-           isNear(a.columnSpacing, b.columnSpacing) && isNear(a.rowSpacing, b.rowSpacing) &&
-           isNear(a.alongRow, b.alongRow) && isNear(a.alongColumn, b.alongColumn);
+           a.photometric == b.photometric && isNear(a.columnSpacing, b.columnSpacing) &&
+           isNear(a.rowSpacing, b.rowSpacing) && isNear(a.alongRow, b.alongRow) &&
+           isNear(a.alongColumn, b.alongColumn);
 }
 
 void leaveOut(const StackFrames& frames, const QString& reason, QVector<LeftOutFrame>& leftOut)
@@ -86,6 +88,46 @@ QVector<StackFrames> groupedByKind(const QVector<StackFrame>& frames, QVector<Le
                      leftOut);
     }
     return groups;
+}
+
+/// Frames of equal Frame of Reference together, in the order of first appearance.
+QVector<StackFrames> partedByReference(const StackFrames& group)
+{
+    QHash<QByteArray, int> partOf;
+    QVector<StackFrames> parts;
+    for (const StackFrame* frame : group) {
+        const auto known = partOf.constFind(frame->frameOfReference);
+        const int part = known != partOf.constEnd() ? *known : parts.size();
+        if (part == parts.size()) {
+            partOf.insert(frame->frameOfReference, part);
+            parts.append(StackFrames());
+        }
+        parts[part].append(frame);
+    }
+    return parts;
+}
+
+/// Parts too small for a stack are told here, where it is known that there are more slices like them.
+QVector<StackFrames> partedByReference(const QVector<StackFrames>& groups, QVector<LeftOutFrame>& leftOut)
+{
+    QVector<StackFrames> result;
+    for (const StackFrames& group : groups) {
+        const QVector<StackFrames> parts = partedByReference(group);
+        const bool areCut = parts.size() > 1 && group.size() >= kLeastSlices;
+        for (const StackFrames& part : parts) {
+            if (areCut && part.size() < kLeastSlices)
+                leaveOut(
+                    part,
+                    QStringLiteral("Its Frame of Reference is not that of the other slices of its geometry"),
+                    leftOut);
+            else
+                result.append(part);
+        }
+    }
+    // As the frames lie in the series.
+    std::sort(result.begin(), result.end(),
+              [](const StackFrames& a, const StackFrames& b) { return a.first() < b.first(); });
+    return result;
 }
 
 Vec3d meanStep(const StackFrames& run)
@@ -203,15 +245,17 @@ void planGroup(const StackFrames& group, StackPlan& plan)
 
 }  // namespace
 
-StackPlan planStacks(const TagMap& series)
+StackPlan planStacks(const TagMap& series, FrameOfReference reference)
 {
     StackPlan plan;
     QVector<StackFrame> frames;
     const QVector<const TagMap*> images = imagesInOrder(series);
     for (const TagMap* image : images)
         frames += stackFramesOf(*image, plan.leftOut);
-    const QVector<StackFrames> groups = groupedByKind(frames, plan.leftOut);
-    for (const StackFrames& group : groups)
+    QVector<StackFrames> groups = groupedByKind(frames, plan.leftOut);
+    if (reference == FrameOfReference::Shared)
+        groups = partedByReference(groups, plan.leftOut);
+    for (const StackFrames& group : qAsConst(groups))
         planGroup(group, plan);
     return plan;
 }

@@ -40,12 +40,16 @@ struct StackPlan
 /// Fewer slices make no stack.
 constexpr int kLeastSlices = 3;
 
+/// Whether slices of one stack share their Frame of Reference. Anonymisers that give each image one of its own leave
+/// nothing that says the positions belong together; who knows that they do ignores it.
+enum class FrameOfReference { Shared, Ignored };
+
 /// Plans which images of a series, or frames of them, form stacks. It goes by the cached metadata alone and does not
 /// depend on the order of the images in the tree. The plan points into the series and is valid while that stays
 /// unchanged.
 ///
 /// Slices of one stack are grey and agree in size, Pixel Spacing (one part in a thousand), Photometric Interpretation,
-/// Frame of Reference and orientation (2/1000 in each cosine). They may differ in bits, sign and rescale.
+/// Frame of Reference (but see `FrameOfReference`) and orientation (2/1000 in each cosine). They may differ in bits, sign and rescale.
 ///
 /// Where several lie in one plane (within 0.01 mm), the series is split by the first attribute that divides them evenly
 /// (time, echo, diffusion, image type and so on), several times if need be; without one by the order of the images
@@ -53,6 +57,6 @@ constexpr int kLeastSlices = 3;
 ///
 /// The step from slice to slice must be constant within 0.11 mm, because positions are rounded, and within a quarter
 /// of the step, so that a missing slice is always noticed. Where it is not, the stack ends and another begins.
-KDD_EXPORT StackPlan planStacks(const TagMap& series);
+KDD_EXPORT StackPlan planStacks(const TagMap& series, FrameOfReference frames = FrameOfReference::Shared);
 
 }  // namespace Kdd

@@ -120,13 +120,12 @@ QVector<StackFrames> partedByOrder(const StackFrames& frames, int most, QVector<
                                     [&](const StackFrames& plane) { return plane.size() == most; });
     QVector<StackFrames> parts(isFull ? most : 1);
     for (const StackFrames& plane : planes) {
-        const StackFrame& taken = *plane.first();
         for (int i = 0; i < parts.size(); ++i)
             parts[i].append(plane.at(i));
         for (int i = parts.size(); i < plane.size(); ++i)
             leftOut.append(leftOutFrame(
-                *plane.at(i), QStringLiteral("%1 lies in the same plane, and nothing tells them apart")
-                                  .arg(QString::fromLatin1(taken.imageUID))));
+                *plane.at(i),
+                QStringLiteral("It lies in the plane of another slice, and nothing tells them apart")));
     }
     return parts;
 }

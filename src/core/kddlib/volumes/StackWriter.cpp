@@ -1,6 +1,6 @@
 #include "kddlib/volumes/StackWriter.h"
 
-#include "kddlib/net/DicomFileReader.h"
+#include "kddlib/net/KxDcmFileLoader.h"
 #include "kddlib/volumes/StackParameters.h"
 #include "kddlib/volumes/StackPlanner.h"
 #include "kddlib/volumes/StackValues.h"
@@ -52,7 +52,7 @@ private:
         const QByteArray path = mPathOf(slice.tags.image());
         if (path.isEmpty())
             return Result::failure(QStringLiteral("The image has no file"));
-        const OFCondition condition = readDicomFile(path.constData(), mFile);
+        const OFCondition condition = loadDicomFile(path.constData(), mFile);
         if (condition.bad())
             return Result::failure(QString::fromLocal8Bit(condition.text()));
         return checkImage(slice.imageUID);

@@ -6,6 +6,8 @@ namespace Kdd
 
 void TagMap::addBareVolume(Volume* volume)
 {
+    if (mVolumes.contains(volume))
+        return;
     mVolumes.append(volume);
     if (volume->mVolumeIndex < 0)
         volume->mVolumeIndex = mVolumes.size();

@@ -1,0 +1,136 @@
+#include "kddlib/net/DamagedFile.h"
+
+#include "kddlib/net/DicomFileReader.h"
+#include "support/DatasetBuilder.h"
+
+#include <QFile>
+#include <QTemporaryDir>
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+namespace Kdd
+{
+namespace
+{
+
+const QByteArray kItem("\xfe\xff\x00\xe0\xff\xff\xff\xff", 8);
+const QByteArray kItemEnd("\xfe\xff\x0d\xe0\0\0\0\0", 8);
+const QByteArray kSequenceEnd("\xfe\xff\xdd\xe0\0\0\0\0", 8);
+const QByteArray kOpenPixels("\xe0\x7f\x10\x00OB\0\0\xff\xff\xff\xff", 12);
+const QByteArray kOffsets("\xfe\xff\x00\xe0\0\0\0\0", 8);
+const QByteArray kFragment("\xfe\xff\x00\xe0\x02\0\0\0ab", 10);
+
+/// A file with a sequence before the UIDs of study and series and a long text behind them.
+QByteArray soundFile(E_EncodingType lengths = EET_UndefinedLength)
+{
+    QTemporaryDir folder;
+    const QString path = folder.filePath(QStringLiteral("sound"));
+    DatasetBuilder image = anImage("1");
+    image.withItem(DCM_ReferencedStudySequence, anItem().with(DCM_PatientID, "inside"));
+    image.withLong(DCM_TextValue, 2000);
+    DcmFileFormat file(&image.dataset());
+    EXPECT_TRUE(
+        file.saveFile(path.toLocal8Bit().constData(), EXS_LittleEndianExplicit, lengths, EGL_withoutGL)
+            .good());
+    QFile written(path);
+    return written.open(QIODevice::ReadOnly) ? written.readAll() : QByteArray();
+}
+
+QByteArray declaredAsRle(QByteArray file)
+{
+    return file.replace(QByteArray("1.2.840.10008.1.2.1\0", 20), QByteArray("1.2.840.10008.1.2.5\0", 20));
+}
+
+QByteArray withNativePixels(int bytes)
+{
+    QByteArray file = soundFile();
+    file +=
+        QByteArray("\x28\x00\x02\x00US\x02\0\x01\0", 10) + QByteArray("\x28\x00\x10\x00US\x02\0\x02\0", 10) +
+        QByteArray("\x28\x00\x11\x00US\x02\0\x02\0", 10) + QByteArray("\x28\x00\x00\x01US\x02\0\x08\0", 10);
+    return file + QByteArray("\xe0\x7f\x10\x00OB\0\0", 8) + char(bytes) + QByteArray(3, 0) +
+           QByteArray(bytes, 'x');
+}
+
+struct Damage
+{
+    const char* name;
+    QByteArray file;
+    const char* leftOut;
+    bool hasSequence;
+    bool hasText;
+    bool hasPixels;
+};
+
+const Damage kDamages[] = {
+    {"CutInTheLastValue", soundFile().chopped(100), "(0040,a160) and what follows from byte", true, false,
+     false},
+    {"CutInAHead", soundFile() + "\x50\x00\x10", "what follows from byte", true, true, false},
+    {"Garbage", soundFile() + "<!-- what a mailer appended -->", "and what follows from byte", true, true,
+     false},
+    {"Zeros", soundFile() + QByteArray(21, 0), "what follows from byte", true, true, false},
+    {"ItemWithoutEnd", soundFile().replace(kItemEnd, ""), "(0008,1110)", false, true, false},
+    {"ItemEndsTheSequence", soundFile().replace(kSequenceEnd, ""), "(0008,1110)", false, true, false},
+    {"LengthInsideIsTooLong",
+     soundFile(EET_ExplicitLength)
+         .replace(QByteArray("LO\6\0inside", 10), QByteArray("LO\xff\xffinside", 10)),
+     "(0008,1110)", false, true, false},
+    {"PixelsAreNotCompressed", declaredAsRle(withNativePixels(4)), "the declared compression", true, true,
+     true},
+    {"PixelsAreNeither", declaredAsRle(withNativePixels(6)), "(7fe0,0010)", true, true, false},
+    {"FragmentIsCut", declaredAsRle(soundFile()) + kOpenPixels + kOffsets + kFragment + kFragment.chopped(1),
+     "the end of (7fe0,0010)", true, true, true},
+    {"OnlyFragmentIsCut", declaredAsRle(soundFile()) + kOpenPixels + kOffsets + kFragment.chopped(1),
+     "(7fe0,0010)", true, true, false},
+};
+
+class DamagedFile : public testing::Test
+{
+protected:
+    QByteArray put(const QByteArray& content) const
+    {
+        QFile file(mFolder.filePath(QStringLiteral("file")));
+        EXPECT_TRUE(file.open(QIODevice::WriteOnly) && file.write(content) == content.size());
+        return file.fileName().toLocal8Bit();
+    }
+
+    QTemporaryDir mFolder;
+};
+
+TEST_F(DamagedFile, GivesWhatIsSoundAndTellsTheRest)
+{
+    for (const Damage& damage : kDamages) {
+        const QByteArray path = put(damage.file);
+        DcmFileFormat file;
+        QString leftOut;
+        EXPECT_TRUE(readDicomFile(path.constData(), file).bad()) << damage.name;
+        ASSERT_TRUE(readDamagedDicomFile(path.constData(), file, leftOut).good()) << damage.name;
+        EXPECT_THAT(leftOut.toStdString(), testing::HasSubstr(damage.leftOut)) << damage.name;
+        DcmDataset& dataset = *file.getDataset();
+        EXPECT_TRUE(dataset.tagExistsWithValue(DCM_StudyInstanceUID)) << damage.name;
+        EXPECT_EQ(dataset.tagExists(DCM_ReferencedStudySequence), damage.hasSequence) << damage.name;
+        EXPECT_EQ(dataset.tagExists(DCM_TextValue), damage.hasText) << damage.name;
+        EXPECT_EQ(dataset.tagExists(DCM_PixelData), damage.hasPixels) << damage.name;
+    }
+}
+
+TEST_F(DamagedFile, IsRefusedAsBeforeWhereverItIsCutBeforeItNamesItself)
+{
+    const QByteArray sound = soundFile();
+    DcmFileFormat file;
+    QString leftOut;
+    int taken = 0;
+    for (int length = 0; length < sound.size(); length += length < 500 ? 1 : 61) {
+        const QByteArray path = put(sound.left(length));
+        const bool isTaken = readDicomFile(path.constData(), file).bad() &&
+                             readDamagedDicomFile(path.constData(), file, leftOut).good();
+        taken += isTaken ? 1 : 0;
+        EXPECT_TRUE(!isTaken || file.getDataset()->tagExistsWithValue(DCM_SeriesInstanceUID)) << length;
+    }
+    EXPECT_GT(taken, 20) << "the long text";
+    EXPECT_TRUE(readDamagedDicomFile(put(sound).constData(), file, leftOut).good());
+    EXPECT_TRUE(leftOut.isEmpty()) << "nothing is wrong with it";
+}
+
+}  // namespace
+}  // namespace Kdd
