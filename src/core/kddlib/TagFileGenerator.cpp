@@ -13,6 +13,7 @@
 #include "kddlib/volumes/VolumeInfo.h"
 #include "platform/base/LogFile.h"
 #include "platform/database/Kxg.h"
+#include "platform/os/PathName.h"
 #include "platform/volumefile/OrlanMesh.h"
 
 #include <QHash>
@@ -267,7 +268,7 @@ void TagFileGenerator::addPreviews(TagFile& tagFile, const QList<QByteArray>& ch
         DcmDataset* dataset = datasets.find(sopUID);
         if (dataset == nullptr && loadDicomFile(path.constData(), reloaded).good())
             dataset = reloaded.getDataset();
-        tagFile.addPreview(image, dataset, QString::fromLocal8Bit(path));
+        tagFile.addPreview(image, dataset, pathText(path));
     }
 }
 

@@ -290,6 +290,9 @@ private:
             return mInOrder.take(uid);
         }
 
+        /// Lets go of an image, by its key if it still stands under that: what the key was made from may have changed.
+        void remove(TagMap* image, const QByteArray& key) { take(find(key) == image ? key : mInOrder.key(image)); }
+
     private:
         NodeIndex mInOrder;
         QHash<QByteArray, TagMap*> mHashed;
@@ -303,23 +306,30 @@ private:
     };
 
     class BodyReader;
+    class DatabaseView;
     class QAJob;
     class QAVolumes;
 
     static QByteArray imageKey(const TagMap& image);
-    void replaceImage(TagMap* old);
+    void replaceImage(TagMap* old, TagMap& image, const QByteArray& seriesUID);
     void placeInSeries(TagMap* image, const QByteArray& seriesUID, const QByteArray& studyUID);
     void dropSeries(TagMap* series);
     void dropImage(TagMap* image);
     void dropStudyIfEmpty(TagMap* study);
     static void forgetUnseen(TagMap& node);
 
-    TagMap* makeImage(TagMap* series, const QByteArray& sopUID);
+    TagMap* makeImage(TagMap* series, const Kxg::ImageFile& file);
     TagMap* findImage(const Kxg::ImageFile& file) const;
     bool syncSeries(TagMap& series, const Kxg::DicomDirectoryEntry& entry);
-    bool syncImages(TagMap& series, const Kxg::SeriesInfo& info);
+    bool removeUnlisted(const DatabaseView& view);
 
     QVector<TagMap*> imagesOf(const VolumeInfo& info, int volumeIndex) const;
+
+    /// Makes sure that a reader will rebuild the same images for each slice of every volume; a volume that lost its last
+    /// image goes. Else the reason, with the images of every volume as they were.
+    static QString settleVolumes(TagMap& series);
+    static void renumberVolumes(TagMap& series);
+    static void releaseImagesOfOthers(const TagMap& series);
 
     bool write(QDataStream& out, CompressionMode mode);
     QByteArray serialized(CompressionMode mode);

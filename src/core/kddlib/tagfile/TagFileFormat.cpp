@@ -166,6 +166,11 @@ bool TagFile::write(QDataStream& out, CompressionMode mode)
     QList<QByteArray> blobs;
     mStatistics.volumes = 0;
     for (const std::shared_ptr<TagMap>& study : qAsConst(mStudies)) {
+        for (TagMap* series : study->children()) {
+            const QString reason = settleVolumes(*series);
+            if (!reason.isEmpty())
+                return fail(reason);
+        }
         study->relinkItems();
         mStatistics.volumes += writeStudy(body, *study, blobs);
     }
@@ -287,8 +292,7 @@ private:
     TagMap* readBelow(KxMsg& record, TagMap* parent)
     {
         auto* node = new TagMap;
-        node->mParent = parent;
-        parent->mChildren.append(node);
+        parent->appendChild(node);
         node->deserialize(record, parent, mContext);
         return node;
     }

@@ -7,6 +7,7 @@
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/Volume.h"
 #include "platform/base/LogFile.h"
+#include "platform/os/PathName.h"
 #include "platform/volume/KxVolumeInfo.h"
 
 #include <QCryptographicHash>
@@ -215,7 +216,7 @@ bool TagFile::addPreview(const QByteArray& sopInstanceUID, const QString& path)
     if (image == nullptr)
         return false;
     DcmFileFormat file;
-    const OFCondition condition = loadDicomFile(QFile::encodeName(path).constData(), file);
+    const OFCondition condition = loadDicomFile(pathBytes(path).constData(), file);
     if (condition.bad()) {
         LogFile::warnf(kNotCreated, qUtf8Printable(path), condition.text());
         return false;

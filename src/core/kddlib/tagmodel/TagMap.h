@@ -6,6 +6,7 @@
 #include <QByteArray>
 #include <QList>
 #include <QMap>
+#include <QVector>
 
 #include <dcmtk/dcmdata/dctagkey.h>
 
@@ -28,6 +29,7 @@ class KxMsg;
 class TagElement;
 class TagSequence;
 class Volume;
+class VolumeImages;
 
 /// One node of a study's tree: the study, a series, an image, or an item of a sequence.
 ///
@@ -231,6 +233,11 @@ public:
 
 protected:
     friend class TagFile;
+    friend class VolumeImages;
+
+    /// Hangs a child below this node as it is, and takes it over: it inherits all it does not hold, and neither node
+    /// gives or loses an attribute.
+    void appendChild(TagMap* child);
 
     void insertUID(Level level, TagElement* uid);
     TagElement* removeUID(Level level);
@@ -256,7 +263,10 @@ private:
     void relinkOwnItems();
     void hangBelow(TagMap* item);
     void forgetParent();
-    void forgetInVolumes(const TagMap* image);
+    void leaveVolumes();
+
+    /// Takes the places of another image in its volumes; that one is in none of them any more.
+    void takeVolumePlaces(TagMap& former);
     void forgetVolumeSuffixes();
     void releaseAll();
 
@@ -281,9 +291,17 @@ private:
     static std::unique_ptr<TagElement> readSequence(KxMsg& in, const DcmTagKey& key, const TagMap* parent,
                                                     RecordContext& context);
 
+    /// Where a volume's list of images names this node.
+    struct VolumePlace
+    {
+        VolumeImages* images;
+        int place;
+    };
+
     TagMap* mParent = nullptr;
     QList<TagMap*> mChildren;
     QList<Volume*> mVolumes;
+    QVector<VolumePlace> mVolumePlaces;
     Tags mTags;
     bool mIsSequenceItem = false;
     bool mOwns = true;

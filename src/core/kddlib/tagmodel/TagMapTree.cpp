@@ -73,6 +73,7 @@ TagMap::~TagMap()
 void TagMap::releaseAll()
 {
     clearVolumes();
+    leaveVolumes();
     const QList<TagMap*> children = mChildren;
     for (TagMap* child : children) {
         if (mIsSequenceItem) {
@@ -101,16 +102,20 @@ bool TagMap::removeChildMap(TagMap* child)
 {
     if (mChildren.isEmpty())
         return false;
-    forgetInVolumes(child);
-    if (mChildren.first() == child) {
+    if (mChildren.first() == child)
         mChildren.removeFirst();
-        return true;
-    }
-    if (mChildren.last() == child) {
+    else if (mChildren.last() == child)
         mChildren.removeLast();
-        return true;
-    }
-    return mChildren.removeOne(child);
+    else if (!mChildren.removeOne(child))
+        return false;
+    child->leaveVolumes();
+    return true;
+}
+
+void TagMap::appendChild(TagMap* child)
+{
+    child->mParent = this;
+    mChildren.append(child);
 }
 
 TagElement* TagMap::removeUID(Level level)
