@@ -203,7 +203,8 @@ TEST_F(GeneratorTest, PartsKeepTheirNumbersAndNamesThroughASync)
         const QByteArray number = QByteArray::number(part);
         addFile(anImage(number.constData()), number);
         if (part != 5)
-            addVolume("1.2.3-volume" + (part > 1 ? "_part" + number : QByteArray()) + ".vol", {number.toStdString()});
+            addVolume("1.2.3-volume" + (part > 1 ? "_part" + number : QByteArray()) + ".vol",
+                      {number.toStdString()});
     }
     TagFile file;
     ASSERT_TRUE(build(file));

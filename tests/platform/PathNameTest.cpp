@@ -9,7 +9,8 @@ namespace
 
 TEST(PathName, GivesEveryNameBack)
 {
-    const QByteArray names[] = {"", "/a/b.tc", "/m\xc3\xa9ta/x", "/m\xe9ta/x", "\xff\xfe", "\xed\xb2\x80", "/\xf0\x9f\x98\x80\xe9"};
+    const QByteArray names[] = {"",         "/a/b.tc",      "/m\xc3\xa9ta/x",       "/m\xe9ta/x",
+                                "\xff\xfe", "\xed\xb2\x80", "/\xf0\x9f\x98\x80\xe9"};
     for (const QByteArray& name : names) {
         EXPECT_EQ(pathBytes(pathText(name)), name) << name.toHex().constData();
         EXPECT_EQ(pathBytes(pathText(name) + QStringLiteral(".journal")), name + ".journal");

@@ -23,7 +23,7 @@ constexpr int kVolume = static_cast<int>(FileKind::Volume);
 struct StudyFiles
 {
     std::vector<std::string> dicom;
-    QVector<QByteArray> volumes;  // in the order of their parts
+    QVector<QByteArray> volumes;       // in the order of their parts
     std::set<std::string> withVolume;  // series, in the order of their bytes
 };
 

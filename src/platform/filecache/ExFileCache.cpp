@@ -17,8 +17,7 @@ Result ExFileCache::init(const char* folder)
     const QByteArray name = folder == nullptr ? ExResource::fileCacheFolder() : QByteArray(folder);
     const QString path = QFile::decodeName(name);
     if (!isPlainText(name))
-        return Result::failure(
-            QStringLiteral("The name of the file cache's folder %1 is no text").arg(path));
+        return Result::failure(QStringLiteral("The name of the file cache's folder %1 is no text").arg(path));
     if (path.isEmpty())
         return Result::failure(QStringLiteral("No folder is set for the file cache"));
     if (!QDir().mkpath(path) || !QFileInfo(path).isWritable())

@@ -51,7 +51,8 @@ Values readFile()
 {
     const QString path = filePath();
     if (!isPlainText(qgetenv("KDD_CONFIG"))) {
-        LogFile::warnf("The settings in %s cannot be read: the name is no text", qgetenv("KDD_CONFIG").constData());
+        LogFile::warnf("The settings in %s cannot be read: the name is no text",
+                       qgetenv("KDD_CONFIG").constData());
         return {};
     }
     // Nobody has to have a file, but one that is named is meant to be there.

@@ -36,7 +36,8 @@ QStringList storedTagFiles()
     for (; !error && files != std::filesystem::recursive_directory_iterator(); files.increment(error)) {
         std::error_code unknown;
         // One without content is just being made.
-        if (files->path().extension() == ".tc" && files->is_regular_file(unknown) && files->file_size(unknown) > 0)
+        if (files->path().extension() == ".tc" && files->is_regular_file(unknown) &&
+            files->file_size(unknown) > 0)
             paths.append(pathText(QByteArray::fromStdString(files->path().native())));
     }
     paths.sort();

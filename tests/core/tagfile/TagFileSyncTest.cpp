@@ -198,7 +198,8 @@ TEST_F(TagFileSyncTest, VolumesAreNamedByTheirSuffixWhereTheNumbersHaveGaps)
         series->addBareVolume(new Volume(series->volumes().size()));
         series->volumes().last()->setFileNameSuffix(suffix);
     }
-    for (const char* name : {"x-volume_part2.vol", "y-volume_part011.vol", "x-volume_part3.vol", "x-volume.vol"})
+    for (const char* name :
+         {"x-volume_part2.vol", "y-volume_part011.vol", "x-volume_part3.vol", "x-volume.vol"})
         file.addVolumeFilePath(series, volumeFile(name), false);
     QList<QByteArray> names;
     for (const Volume* volume : series->volumes())

@@ -2,6 +2,8 @@
 #include "kddlib/volumes/Volume.h"
 #include "kddlib/volumes/VolumeInfo.h"
 
+#include <algorithm>
+
 namespace Kdd
 {
 namespace
@@ -141,16 +143,19 @@ TEST_F(WrittenVolumes, StayRightWhereOneByteCannotTellThemApart)
     EXPECT_EQ(reread(), expected);
 }
 
-TEST_F(WrittenVolumes, AreRefusedWhenNoByteIsLeft)
+TEST_F(WrittenVolumes, AreLeftOutWhenNoByteIsLeft)
 {
+    const LogCapture log;
     std::vector<VolumeInfo> infos;
     for (int i = 0; i < 257; ++i)
         infos.push_back(info({"1"}, ("x-" + std::to_string(i) + ".vol").c_str()));
     addVolumes(infos);
-    EXPECT_FALSE(file.writeCacheFile());
-    EXPECT_TRUE(file.failure().contains(QStringLiteral("cannot tell its 257 volumes apart")));
-    EXPECT_EQ(volumes().size(), 257);
-    EXPECT_EQ(volumes().last()->sopUIDList(), std::vector<std::string>{"1"});
+    ASSERT_EQ(volumes().size(), 257);
+    const std::string text = reread();
+    EXPECT_EQ(std::count(text.begin(), text.end(), '\n'), 256);
+    EXPECT_EQ(text.find("256: "), std::string::npos);
+    EXPECT_NE(text.find("255: 1\n"), std::string::npos);
+    EXPECT_EQ(log.count("Volume 256 of series 1.2.3 is left out of the tag file"), 1);
 }
 
 TEST_F(TagFileVolumesTest, VolumesAndTheirImagesComeBackFromTheFile)

@@ -95,7 +95,8 @@ protected:
         for (const std::string& each : info.frameIdentifiers) {
             const QByteArray uid = QByteArray::fromStdString(each.substr(0, each.rfind('.')));
             const bool isHeld = mSeries.count(uid) != 0 && mSeries[uid] == stack.series;
-            stack.slices.emplace_back(isHeld ? uid : QByteArray(), std::stoi(each.substr(each.rfind('.') + 1)));
+            stack.slices.emplace_back(isHeld ? uid : QByteArray(),
+                                      std::stoi(each.substr(each.rfind('.') + 1)));
         }
         if (!stack.series.isEmpty())
             mStacks[Volume::fileNameSuffix(info.name.constData())] = stack;

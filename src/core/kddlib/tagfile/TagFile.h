@@ -179,7 +179,8 @@ public:
     bool writeCacheFile();
     bool writeCacheFile(const char* path);
 
-    /// Writes to a stream; false only when the study is too large for the format.
+    /// Writes to a stream; false only when the study is too large for the format, or has images of so many volumes that
+    /// the format cannot tell them apart. A volume that lost all its images goes before any write.
     bool writeCacheFile(QDataStream& out);
 
     /// Brings the images held here into the study's file, in place of images with the same UID, while the file is
@@ -189,8 +190,9 @@ public:
 
     // ---- volumes
 
-    /// Adds the volumes of one series, whose indexes are their places in `infos`. Images that are not held are warned
-    /// about and passed over; a volume none of whose images is held is not made.
+    /// Adds the volumes of one series, whose indexes are their places in `infos`. Images that are not held, or belong
+    /// to another series than the volume's first one, are warned about and passed over; a volume none of whose images
+    /// is held is not made.
     void addVolumeInfo(const std::vector<VolumeInfo*>& infos);
 
     /// Called when a study's volumes are complete; there is nothing left to do then.
@@ -237,8 +239,8 @@ public:
     /// false, or are made with `createMissing`. How many images received a path.
     int addDicomFilePaths(TagMap* series, const Kxg::SeriesInfo* info, bool createMissing, bool& complete);
 
-    /// Gives the volume that a volume file's name stands for that name; `createMissing` makes the volume first. Other
-    /// entries change nothing.
+    /// Gives the volume that a volume file's name stands for that name: the one of its suffix, else of its part number.
+    /// `createMissing` makes a volume that is not there. Other entries change nothing.
     static void addVolumeFilePath(TagMap* series, const Kxg::DicomDirectoryEntry& entry, bool createMissing);
 
     /// Marks the study as known to the database, and adds an empty series for each one that only the database has but
@@ -254,7 +256,8 @@ public:
     bool readAndSync(const char* studyUID, const char* user);
 
     /// Brings the tree into line with what the database says of the study: file paths, volume names, series that are
-    /// gone. Whether anything changed.
+    /// gone. An image that a correction moved here or renamed stays. Another study's entry is refused. Whether anything
+    /// changed.
     bool syncWithDatabase(const std::shared_ptr<Kxg::DicomDirectoryEntry>& study);
 
     /// Why the last read, write or merge failed, in words; empty after success.
@@ -291,7 +294,10 @@ private:
         }
 
         /// Lets go of an image, by its key if it still stands under that: what the key was made from may have changed.
-        void remove(TagMap* image, const QByteArray& key) { take(find(key) == image ? key : mInOrder.key(image)); }
+        void remove(TagMap* image, const QByteArray& key)
+        {
+            take(find(key) == image ? key : mInOrder.key(image));
+        }
 
     private:
         NodeIndex mInOrder;

@@ -99,7 +99,8 @@ QString TagFile::settleVolumes(TagMap& series)
                      .arg(series.mVolumes.size());
 }
 
-/// Indexes are places. An image of several volumes has a byte for each, so these get the first places.
+/// Indexes are places. An image of several volumes has a byte for each, so these get the first places; those for which
+/// no byte is left are read from their files.
 void TagFile::renumberVolumes(TagMap& series)
 {
     const QHash<const TagMap*, int> counts = countVolumes(series.mVolumes);
@@ -112,6 +113,15 @@ void TagFile::renumberVolumes(TagMap& series)
     };
     if (series.mVolumes.size() > kVolumesToldApart)
         std::stable_partition(series.mVolumes.begin(), series.mVolumes.end(), sharesImages);
+    for (int i = series.mVolumes.size() - 1; i >= kVolumesToldApart; --i) {
+        const Volume* volume = series.mVolumes.at(i);
+        if (!sharesImages(volume))
+            continue;
+        LogFile::errorf("Volume %s of series %s is left out of the tag file: more than %d share their images",
+                        volume->fileNameSuffix().constData(), series.uid(TagMap::SeriesLevel).constData(),
+                        kVolumesToldApart);
+        delete series.mVolumes.takeAt(i);
+    }
     for (int i = 0; i < series.mVolumes.size(); ++i)
         series.mVolumes.at(i)->mVolumeIndex = i;
 }

@@ -29,7 +29,6 @@ public:
 
     bool hasGaps() const { return mHasGaps; }
 
-
     /// Moves the images together. For each former place the new one, -1 for a gap.
     QVector<int> closeGaps();
 

@@ -93,8 +93,9 @@ KxHistogram histogramOf(const OrlanMesh& mesh, const QByteArray& path)
         if (histogram.numBins() > 0)
             return histogram;
     }
-    const QString reason =
-        result.bad() ? result.text() : QStringLiteral("nothing tells the range of its %1 bins").arg(counts.size());
+    const QString reason = result.bad()
+                               ? result.text()
+                               : QStringLiteral("nothing tells the range of its %1 bins").arg(counts.size());
     LogFile::warnf("3D volume %s has no usable histogram: %s", path.constData(), qUtf8Printable(reason));
     return {};
 }
