@@ -13,6 +13,7 @@
 #include "kddlib/volumes/VolumeInfo.h"
 #include "platform/base/LogFile.h"
 #include "platform/database/Kxg.h"
+#include "platform/os/PathName.h"
 #include "platform/volumefile/OrlanMesh.h"
 
 #include <QHash>
@@ -266,7 +267,7 @@ void TagFileGenerator::addPreviews(TagFile& tagFile, const QList<QByteArray>& ch
             continue;
         const QByteArray path = filePathOf(*image);
         if (DcmDataset* dataset = datasets.find(sopUID))
-            tagFile.addPreview(image, dataset, QString::fromLocal8Bit(path));
+            tagFile.addPreview(image, dataset, pathText(path));
         else
             tagFile.addPreview(image, path);
     }

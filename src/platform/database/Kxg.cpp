@@ -6,9 +6,11 @@
 #include "platform/database/SqlConnection.h"
 #include "platform/database/StudyContent.h"
 #include "platform/os/FileStatus.h"
+#include "platform/volumefile/VolumeFileName.h"
 
 #include <QHash>
 
+#include <algorithm>
 #include <set>
 
 namespace Kxg
@@ -21,7 +23,8 @@ constexpr int kVolume = static_cast<int>(FileKind::Volume);
 
 struct StudyFiles
 {
-    std::vector<std::string> dicom, volumes;
+    std::vector<std::string> dicom;
+    QVector<QByteArray> volumes;       // in the order of their parts
     std::set<std::string> withVolume;  // series, in the order of their bytes
 };
 
@@ -33,11 +36,14 @@ StudyFiles readFiles(SqlConnection& connection, int studyId)
                                   " WHERE series.study_id = ? ORDER BY file.path",
                                   {studyId});
     while (rows.next()) {
-        const bool isVolume = rows.number(0) == kVolume;
-        (isVolume ? files.volumes : files.dicom).push_back(rows.bytes(1).toStdString());
-        if (isVolume)
+        if (rows.number(0) == kVolume) {
+            files.volumes.append(rows.bytes(1));
             files.withVolume.insert(rows.text(2).toStdString());
+        } else {
+            files.dicom.push_back(rows.bytes(1).toStdString());
+        }
     }
+    std::sort(files.volumes.begin(), files.volumes.end(), Kdd::isEarlierPart);
     // A study goes with its last file.
     if (files.dicom.empty() && files.volumes.empty())
         throw DatabaseError(QStringLiteral("there is no study of id %1").arg(studyId));
@@ -94,7 +100,7 @@ void readVolumes(SqlConnection& connection, qint64 studyId, DicomDirectoryEntry&
             series->entries.push_back(volumeEntry(*series, rows.bytes(1)));
     for (DicomDirectoryEntry& series : study.entries)
         std::stable_sort(series.entries.begin(), series.entries.end(),
-                         [](const auto& a, const auto& b) { return a.name < b.name; });
+                         [](const auto& a, const auto& b) { return Kdd::isEarlierPart(a.name, b.name); });
 }
 
 }  // namespace
@@ -106,7 +112,9 @@ Kdd::Result GetAllFilesOfStudy(const QByteArray& user, int studyId, std::vector<
         noteUser(connection, user);
         StudyFiles files = readFiles(connection, studyId);
         dicomFiles.swap(files.dicom);
-        volumeFiles.swap(files.volumes);
+        volumeFiles.clear();
+        for (const QByteArray& path : qAsConst(files.volumes))
+            volumeFiles.push_back(path.toStdString());
         seriesUIDs.assign(files.withVolume.begin(), files.withVolume.end());
     });
 }

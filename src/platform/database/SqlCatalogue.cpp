@@ -4,6 +4,7 @@
 #include "platform/database/FileRegistration.h"
 #include "platform/database/Schema.h"
 #include "platform/database/StudyContent.h"
+#include "platform/volumefile/VolumeFileName.h"
 
 #include <algorithm>
 
@@ -196,6 +197,7 @@ Kdd::Result SqlCatalogue::volumeFiles(const QByteArray& studyUID, QVector<QByteA
                                        {textValue(studyUID), kVolume});
         while (rows.next())
             found.push_back(rows.bytes(0));
+        std::sort(found.begin(), found.end(), Kdd::isEarlierPart);
         paths.swap(found);
     });
 }

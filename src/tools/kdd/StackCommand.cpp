@@ -5,6 +5,7 @@
 #include "kddlib/volumes/StackWriter.h"
 #include "platform/base/LogFile.h"
 #include "platform/os/FileStatus.h"
+#include "platform/os/PathName.h"
 #include "tools/kdd/Commands.h"
 #include "tools/kdd/Database.h"
 #include "tools/kdd/Progress.h"
@@ -12,10 +13,12 @@
 #include "tools/kdd/Store.h"
 #include "tools/kdd/StudyBuild.h"
 
-#include <QDir>
 #include <QJsonArray>
 
+#include <unistd.h>
+
 #include <cstdio>
+#include <filesystem>
 #include <utility>
 
 namespace Kdd
@@ -60,7 +63,7 @@ private:
 
     QByteArray volumePath(const QByteArray& seriesUID, int index) const
     {
-        return QDir(mFolder).filePath(QString::fromLocal8Bit(volumeFileName(seriesUID, index))).toLocal8Bit();
+        return pathBytes(mFolder) + '/' + volumeFileName(seriesUID, index);
     }
 
     Kxg::Catalogue& mDatabase;
@@ -130,13 +133,13 @@ bool StudyStacker::clearSeries(const QByteArray& seriesUID, const TagMap& series
         return false;
     mIsChanged = true;
     for (const QByteArray& path : ours)
-        QFile::remove(QString::fromLocal8Bit(path));
+        ::unlink(path.constData());
     return true;
 }
 
 bool StudyStacker::writeVolume(const QByteArray& seriesUID, const Stack& stack, int index)
 {
-    if (!QDir().mkpath(mFolder)) {
+    if (!makeFolder(mFolder)) {
         LogFile::errorf("Could not create folder %s", qUtf8Printable(mFolder));
         return false;
     }
@@ -165,9 +168,11 @@ bool stackStudy(Kxg::Catalogue& database, const QByteArray& studyUID, StudyStack
 QString volumeFolder(const GlobalOptions& options, const QByteArray& studyUID)
 {
     const QString tagFile = TagFile::cacheFilePathForStudy(studyUID.constData());
-    const QString place = tagFile.mid(QString::fromLocal8Bit(TagFile::metaFolder()).size());
-    return QDir(options.store)
-        .absoluteFilePath(QStringLiteral("volumes/") + place.left(place.lastIndexOf(QLatin1Char('.'))));
+    const QString place = tagFile.mid(pathText(TagFile::metaFolder()).size());
+    const std::filesystem::path store =
+        std::filesystem::absolute(pathBytes(options.store).toStdString()).lexically_normal();
+    return pathText(QByteArray::fromStdString((store / "volumes").native())) + QLatin1Char('/') +
+           place.left(place.lastIndexOf(QLatin1Char('.')));
 }
 
 QJsonObject jsonOf(const StackedSeries& series)

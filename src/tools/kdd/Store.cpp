@@ -1,17 +1,26 @@
 #include "tools/kdd/Store.h"
 
 #include "platform/base/LogFile.h"
+#include "platform/os/FileStatus.h"
+#include "platform/os/PathName.h"
 #include "tools/kdd/Database.h"
 
 #include <QByteArrayList>
-#include <QDirIterator>
-#include <QFileInfo>
+
+#include <filesystem>
+#include <system_error>
 
 namespace Kdd
 {
 
 namespace
 {
+
+bool isThere(const QString& path)
+{
+    FileStatus status;
+    return statusOf(pathBytes(path).constData(), status);
+}
 
 /// Of the studies that a beginning fits so many are named.
 constexpr int kNamesToTell = 3;
@@ -21,13 +30,15 @@ constexpr int kNamesToTell = 3;
 QStringList storedTagFiles()
 {
     QStringList paths;
-    QDirIterator files(QString::fromLocal8Bit(TagFile::metaFolder()), {QStringLiteral("*.tc")}, QDir::Files,
-                       QDirIterator::Subdirectories);
-    while (files.hasNext()) {
-        files.next();
+    // Not by way of Qt, which does not know every name that a folder may have.
+    std::error_code error;
+    std::filesystem::recursive_directory_iterator files(TagFile::metaFolder(), error);
+    for (; !error && files != std::filesystem::recursive_directory_iterator(); files.increment(error)) {
+        std::error_code unknown;
         // One without content is just being made.
-        if (files.fileInfo().size() > 0)
-            paths.append(files.filePath());
+        if (files->path().extension() == ".tc" && files->is_regular_file(unknown) &&
+            files->file_size(unknown) > 0)
+            paths.append(pathText(QByteArray::fromStdString(files->path().native())));
     }
     paths.sort();
     return paths;
@@ -35,7 +46,7 @@ QStringList storedTagFiles()
 
 bool resolveStudy(const QByteArray& text, QByteArray& studyUID)
 {
-    if (QFileInfo::exists(TagFile::cacheFilePathForStudy(text.constData()))) {
+    if (isThere(TagFile::cacheFilePathForStudy(text.constData()))) {
         studyUID = text;
         return true;
     }
@@ -72,7 +83,7 @@ bool readStudyFile(const QString& path, TagFile& file)
 {
     if (file.readWhenFree(path, nullptr, false))
         return true;
-    if (!QFileInfo::exists(path) || file.wasLockedOut())
+    if (!isThere(path) || file.wasLockedOut())
         LogFile::errorf("Could not open %s: %s", qUtf8Printable(path), qUtf8Printable(file.failure()));
     return false;
 }
