@@ -197,13 +197,15 @@ TEST_F(LoaderTest, VolumesAreFoundByTheNamesOfTheirFiles)
         {"/a_part7/1.2.3-volume.vol", 0, "-"},
         {"1.2.3-volume_part002.vol", 1, "-"},
         {"vol_part0.dcm", -1, "Illegal volume index. Cannot load volume from tag file."},
-        {"1-volume_part004.vol", -1, "Illegal volume index."},
+        {"1-volume_part004.vol", -1, "Filename suffix does not match."},
         {"1-volume_part003.vol", -1, "No filename suffix. Cannot load volume from tag file."},
         {"1-other.vol", -1, "Filename suffix does not match."},
+        {"1-volume_part005.vol", 3, "-"},
+        {"1-volume_part008.vol", -1, "Illegal volume index."},
     };
     add("1", "1_0.dcm");
     TagMap* series = file->findSeries("1.2.3");
-    for (const char* suffix : {"volume", "volume_2", ""}) {
+    for (const char* suffix : {"volume", "volume_2", "", "volume_5"}) {
         series->addBareVolume(new Volume(series->volumes().size()));
         series->volumes().last()->setFileNameSuffix(suffix);
     }

@@ -115,7 +115,12 @@ protected:
         parameters.insert("PaddingValue", Parameter::ofIntegers({7}));
         parameters.insert("PaddingRangeMin", Parameter::ofIntegers({1}));
         parameters.insert("PaddingRangeMax", Parameter::ofIntegers({2}));
+        if (mRange != 0)
+            parameters.insert("DataMinMax", Parameter::ofIntegers({0, mRange}));
         ASSERT_TRUE(writer->writeParameters(parameters).good());
+        if (mBins != 0) {
+            EXPECT_TRUE(writer->writeDataSection("Histogram", QVector<quint64>(mBins, 1)).good());
+        }
         ASSERT_TRUE(writer->finish().good());
     }
 
@@ -142,6 +147,8 @@ protected:
 
     TemporaryStore mStore;
     std::unique_ptr<Kxg::Catalogue> database;
+    int mBins = 0;   // of the histograms of volume files
+    int mRange = 0;  // their greatest value, if it is told
 };
 
 TEST_F(GeneratorTest, ImagesVolumesAndPreviewsBecomeOneFile)
@@ -170,6 +177,62 @@ TEST_F(GeneratorTest, ImagesVolumesAndPreviewsBecomeOneFile)
     QByteArray held;
     EXPECT_TRUE(file.findImage("4")->findAndGetString(kFilePath, held));
     EXPECT_EQ(held, path("4"));
+}
+
+TEST_F(GeneratorTest, AHistogramNeedsARangeOrABinForEveryValue)
+{
+    const std::tuple<int, int, double> cases[] = {{3, 90, 90}, {256, 0, 255}, {3, 0, 0}, {256, 8, 8}};
+    const LogCapture log;
+    addFile(anImage("8"), "8");
+    for (const auto& [bins, range, greatest] : cases) {
+        mBins = bins;
+        mRange = range;
+        addVolume("a.vol", {"8"});
+        TagFile file;
+        ASSERT_TRUE(build(file));
+        const KxHistogram& histogram = file.seriesByUID().first()->volumes().first()->histogram();
+        EXPECT_EQ(histogram.maximum(), greatest);
+        EXPECT_EQ(histogram.numBins(), greatest == 0 ? 0 : bins);
+    }
+    EXPECT_EQ(log.count("3D volume " + path("a.vol").toStdString() + " has no usable histogram"), 1);
+}
+
+/// Whatever the order of the bytes of their names.
+TEST_F(GeneratorTest, PartsKeepTheirNumbersAndNamesThroughASync)
+{
+    for (int part = 1; part <= 12; ++part) {
+        const QByteArray number = QByteArray::number(part);
+        addFile(anImage(number.constData()), number);
+        if (part != 5)
+            addVolume("1.2.3-volume" + (part > 1 ? "_part" + number : QByteArray()) + ".vol",
+                      {number.toStdString()});
+    }
+    TagFile file;
+    ASSERT_TRUE(build(file));
+    ASSERT_TRUE(file.readAndSync("1.2", ""));
+    const QList<Volume*>& volumes = file.seriesByUID().first()->volumes();
+    ASSERT_EQ(volumes.size(), 11);
+    for (int i = 0; i < volumes.size(); ++i) {
+        const int part = i < 4 ? i + 1 : i + 2;
+        EXPECT_EQ(volumes.at(i)->volumeIndex(), i);
+        EXPECT_EQ(volumes.at(i)->sopUIDList(), std::vector<std::string>{std::to_string(part)});
+        EXPECT_EQ(Volume::fileNameSuffix(volumes.at(i)->volumeFileName().constData()),
+                  volumes.at(i)->fileNameSuffix());
+        EXPECT_TRUE(part == 1 || volumes.at(i)->fileNameSuffix() == "volume_" + QByteArray::number(part));
+    }
+}
+
+TEST_F(GeneratorTest, ASyncRemovesImagesWhoseSeriesHasOnlyAVolumeFileLeft)
+{
+    addFile(anImage("8"), "8");
+    addFile(anImage("9"), "9");
+    addVolume("1.2.3-volume.vol", {"8", "9"});
+    TagFile file;
+    ASSERT_TRUE(build(file));
+    ASSERT_TRUE(database->removeFiles({path("8"), path("9")}).good());
+    ASSERT_TRUE(file.readAndSync("1.2", ""));
+    EXPECT_TRUE(file.imagesByUID().isEmpty());
+    EXPECT_EQ(file.seriesByUID().keys(), QList<QByteArray>{"1.2.3"});
 }
 
 TEST_F(GeneratorTest, WhatCannotBeUsedIsNamedAndLeftOut)

@@ -12,10 +12,11 @@
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/Volume.h"
-#include "kddlib/volumes/VolumeFileName.h"
+#include "kddlib/volumes/VolumeLookup.h"
 #include "platform/base/LogFile.h"
 #include "platform/base/Stopwatch.h"
 #include "platform/os/RandomAccessFile.h"
+#include "platform/volumefile/VolumeFileName.h"
 
 #include <QFile>
 
@@ -206,20 +207,23 @@ Volume* Loader::loadVolume(const char* path, const QByteArray& seriesUID, const 
     const QByteArray name = baseName(path);
     const int part = partNumberOf(name);
     const int index = part < 0 ? 0 : part - 1;
-    if (index < 0 || index >= series->volumes().size()) {
-        LogFile::warnf("Illegal volume index. Cannot load volume from tag file.");
-        return nullptr;
-    }
-    Volume* volume = series->volumes().at(index);
-    if (volume->fileNameSuffix().isEmpty()) {
-        LogFile::printf("No filename suffix. Cannot load volume from tag file.");
-        return nullptr;
-    }
-    if (Volume::fileNameSuffix(name.constData()) == volume->fileNameSuffix()) {
+    const QByteArray suffix = Volume::fileNameSuffix(name.constData());
+    Volume* volume = index >= 0 ? volumeOfSuffix(*series, suffix, index) : nullptr;
+    if (volume != nullptr && volume->fileNameSuffix() == suffix) {
         // The tree as well as the tag file, which may be given another tree by whoever added it.
         mLent.insert(file.study());
         mLent.insert(mTagFiles.value(studyUID));
         return volume;
+    }
+    // Volumes are numbered without those whose files could not be read; only the suffix tells them apart for sure.
+    volume = volumeOfIndex(*series, index);
+    if (index < 0 || volume == nullptr) {
+        LogFile::warnf("Illegal volume index. Cannot load volume from tag file.");
+        return nullptr;
+    }
+    if (volume->fileNameSuffix().isEmpty()) {
+        LogFile::printf("No filename suffix. Cannot load volume from tag file.");
+        return nullptr;
     }
     LogFile::warnf("Filename suffix does not match. Cannot load volume from tag file.");
     return nullptr;

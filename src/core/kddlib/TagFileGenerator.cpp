@@ -13,6 +13,7 @@
 #include "kddlib/volumes/VolumeInfo.h"
 #include "platform/base/LogFile.h"
 #include "platform/database/Kxg.h"
+#include "platform/os/PathName.h"
 #include "platform/volumefile/OrlanMesh.h"
 
 #include <QHash>
@@ -116,8 +117,11 @@ public:
     {
         const TagMap* image = mImages.value(QByteArray::fromStdString(path), nullptr);
         std::unique_ptr<TagMap> copy(image != nullptr ? image->clone() : nullptr);
-        if (copy != nullptr)
-            copy->deleteElement(kFilePath);
+        if (copy == nullptr)
+            return nullptr;
+        // Given anew when it is placed: attributes that come along would be placed otherwise than those given then.
+        copy->deleteElement(kFilePath);
+        copy->deleteElement(kFileSuffix);
         return copy;
     }
 
@@ -272,7 +276,7 @@ void TagFileGenerator::addPreviews(TagFile& tagFile, const QList<QByteArray>& ch
             continue;
         const QByteArray path = filePathOf(*image);
         if (DcmDataset* dataset = datasets.find(sopUID))
-            tagFile.addPreview(image, dataset, QString::fromLocal8Bit(path));
+            tagFile.addPreview(image, dataset, pathText(path));
         else
             tagFile.addPreview(image, path);
     }

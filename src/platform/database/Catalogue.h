@@ -275,7 +275,7 @@ public:
     /// At most `limit` UIDs that begin with `prefix`, in order.
     virtual Kdd::Result findStudies(const QByteArray& prefix, int limit, QVector<QByteArray>& studyUIDs) = 0;
 
-    /// The volume files of a study, by path.
+    /// The volume files of a study, by part number and path.
     virtual Kdd::Result volumeFiles(const QByteArray& studyUID, QVector<QByteArray>& paths) = 0;
 
     // ---- the queue

@@ -5,6 +5,10 @@
 #include <QUrl>
 #include <QUrlQuery>
 
+#include <filesystem>
+#include <string>
+#include <system_error>
+
 namespace Kxg
 {
 namespace
@@ -42,6 +46,11 @@ Kdd::Result parseSqlite(const QByteArray& text, DatabaseAddress& address)
     const QString file = QString::fromUtf8(text.mid(static_cast<int>(sizeof kSqlite) - 1));
     if (file.isEmpty())
         return refusal(text, QStringLiteral("the file is missing"));
+    // Qt would give a name of its own to a working folder whose name is no text.
+    std::error_code error;
+    const std::string folder = std::filesystem::current_path(error).native();
+    if (QDir::isRelativePath(file) && QDir::currentPath().toUtf8() != QByteArray::fromStdString(folder))
+        return refusal(text, QStringLiteral("the name of the working folder is not UTF-8"));
     // Absolute, so that a later change of the working folder makes no second database, and so that none of the
     // names that are special to the engine gets through.
     address.database = QFileInfo(QDir::cleanPath(file)).absoluteFilePath();

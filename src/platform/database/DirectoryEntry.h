@@ -50,7 +50,7 @@ struct DicomDirectoryEntry
     /// Of a series, once asked for (`GetSeries`).
     std::shared_ptr<SeriesInfo> seriesInfo;
 
-    /// What lies below: ordered by UID (series), by name (files).
+    /// What lies below: ordered by UID (series), by part number and then name (files).
     std::vector<DicomDirectoryEntry> entries;
 };
 

@@ -6,9 +6,11 @@
 #include "platform/database/StudyContent.h"
 #include "platform/database/StudyListing.h"
 #include "platform/os/FileStatus.h"
+#include "platform/volumefile/VolumeFileName.h"
 
 #include <QHash>
 
+#include <algorithm>
 #include <set>
 
 namespace Kxg
@@ -18,7 +20,8 @@ namespace
 
 struct StudyFiles
 {
-    std::vector<std::string> dicom, volumes;
+    std::vector<std::string> dicom;
+    QVector<QByteArray> volumes;       // in the order of their parts
     std::set<std::string> withVolume;  // series, in the order of their bytes
 };
 
@@ -28,10 +31,11 @@ StudyFiles readFiles(SqlConnection& connection, int studyId)
     for (const ListedImage& image : listImages(connection, studyId))
         files.dicom.push_back(image.path.toStdString());
     for (const ListedVolume& volume : listVolumes(connection, studyId)) {
-        if (files.volumes.empty() || files.volumes.back() != volume.path.toStdString())
-            files.volumes.push_back(volume.path.toStdString());
+        if (files.volumes.isEmpty() || files.volumes.last() != volume.path)
+            files.volumes.append(volume.path);
         files.withVolume.insert(volume.seriesInstanceUID.toStdString());
     }
+    std::sort(files.volumes.begin(), files.volumes.end(), Kdd::isEarlierPart);
     // Without files it is about to be forgotten.
     if (files.dicom.empty() && files.volumes.empty())
         throw DatabaseError(QStringLiteral("there is no study of id %1").arg(studyId));
@@ -84,7 +88,7 @@ void readVolumes(SqlConnection& connection, qint64 studyId, DicomDirectoryEntry&
             series->entries.push_back(volumeEntry(*series, volume.path));
     for (DicomDirectoryEntry& series : study.entries)
         std::stable_sort(series.entries.begin(), series.entries.end(),
-                         [](const auto& a, const auto& b) { return a.name < b.name; });
+                         [](const auto& a, const auto& b) { return Kdd::isEarlierPart(a.name, b.name); });
 }
 
 }  // namespace
@@ -96,7 +100,9 @@ Kdd::Result GetAllFilesOfStudy(const QByteArray& user, int studyId, std::vector<
         noteUser(connection, user);
         StudyFiles files = readFiles(connection, studyId);
         dicomFiles.swap(files.dicom);
-        volumeFiles.swap(files.volumes);
+        volumeFiles.clear();
+        for (const QByteArray& path : qAsConst(files.volumes))
+            volumeFiles.push_back(path.toStdString());
         seriesUIDs.assign(files.withVolume.begin(), files.withVolume.end());
     });
 }

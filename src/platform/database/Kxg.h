@@ -24,9 +24,9 @@ namespace Kxg
 KDD_EXPORT void SetDatabaseServer(const QByteArray& address);
 KDD_EXPORT QByteArray DatabaseServer();
 
-/// The files of one study: DICOM files and volume files, both by path, and the UIDs of the series that have a volume
-/// file. `user` is noted in the server's log of the connection and grants nothing. A study that does not exist is a
-/// failure.
+/// The files of one study: DICOM files by path, volume files by part number and path, and the UIDs of the series that
+/// have a volume file. `user` is noted in the server's log of the connection and grants nothing. A study that does not
+/// exist is a failure.
 KDD_EXPORT Kdd::Result GetAllFilesOfStudy(const QByteArray& user, int studyId,
                                           std::vector<std::string>& dicomFiles,
                                           std::vector<std::string>& volumeFiles,

@@ -5,6 +5,7 @@
 #include "platform/database/Schema.h"
 #include "platform/database/StudyContent.h"
 #include "platform/database/StudyListing.h"
+#include "platform/volumefile/VolumeFileName.h"
 
 #include <algorithm>
 #include <utility>
@@ -271,6 +272,7 @@ Kdd::Result SqlCatalogue::volumeFiles(const QByteArray& studyUID, QVector<QByteA
                                        {textValue(studyUID)});
         while (rows.next())
             found.push_back(rows.bytes(0));
+        std::sort(found.begin(), found.end(), Kdd::isEarlierPart);
         paths.swap(found);
     });
 }

@@ -1,5 +1,6 @@
 #include "platform/filecache/ExFileCache.h"
 
+#include "platform/os/PathName.h"
 #include "platform/resources/ExResource.h"
 
 #include <QCryptographicHash>
@@ -13,8 +14,10 @@ namespace Kdd
 
 Result ExFileCache::init(const char* folder)
 {
-    const QString path =
-        QFile::decodeName(folder == nullptr ? ExResource::fileCacheFolder() : QByteArray(folder));
+    const QByteArray name = folder == nullptr ? ExResource::fileCacheFolder() : QByteArray(folder);
+    const QString path = QFile::decodeName(name);
+    if (!isPlainText(name))
+        return Result::failure(QStringLiteral("The name of the file cache's folder %1 is no text").arg(path));
     if (path.isEmpty())
         return Result::failure(QStringLiteral("No folder is set for the file cache"));
     if (!QDir().mkpath(path) || !QFileInfo(path).isWritable())

@@ -1,5 +1,7 @@
 #include "platform/os/ExclusiveFile.h"
 
+#include "platform/os/PathName.h"
+
 #include <QFile>
 
 #include <fcntl.h>
@@ -81,7 +83,7 @@ LockedOpenResult tryOnce(const QByteArray& path, FileLock lock, IfAbsent ifAbsen
 
 LockedOpenResult openLocked(const QString& path, FileLock lock, IfAbsent ifAbsent, LockPolling polling)
 {
-    const QByteArray name = QFile::encodeName(path);
+    const QByteArray name = pathBytes(path);
     const int attempts = std::max(polling.attempts, 1);
     for (int attempt = 1;; ++attempt) {
         const LockedOpenResult result = tryOnce(name, lock, ifAbsent);
@@ -109,7 +111,7 @@ LockedOpenResult openLockedFile(QFile& file, const QString& path, FileLock lock,
 bool removeLocked(QFile& lockedFile, const QString& path)
 {
     // Under the lock up to here: unlinking after the close could hit the file of whoever comes next.
-    const bool removed = ::unlink(QFile::encodeName(path).constData()) == 0 || errno == ENOENT;
+    const bool removed = ::unlink(pathBytes(path).constData()) == 0 || errno == ENOENT;
     const int error = errno;
     lockedFile.close();
     errno = error;

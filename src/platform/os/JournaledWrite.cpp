@@ -1,6 +1,7 @@
 #include "platform/os/JournaledWrite.h"
 
 #include "platform/os/ExclusiveFile.h"
+#include "platform/os/PathName.h"
 
 #include <QFile>
 #include <QFileInfo>
@@ -65,7 +66,7 @@ QString failed(const char* action, const QString& path, int error)
 
 int openFile(const QString& path, int flags, mode_t mode = 0)
 {
-    return ::open(QFile::encodeName(path).constData(), flags | O_CLOEXEC, mode);
+    return ::open(pathBytes(path).constData(), flags | O_CLOEXEC, mode);
 }
 
 // The small functions below give 0, or the errno.
@@ -150,7 +151,7 @@ bool emptyBuffers(QFile& file)
 QString removeJournal(const QString& path)
 {
     const QString journal = journalPath(path);
-    const bool gone = ::unlink(QFile::encodeName(journal).constData()) == 0 || errno == ENOENT;
+    const bool gone = ::unlink(pathBytes(journal).constData()) == 0 || errno == ENOENT;
     return gone ? QString() : failed("remove", journal, errno);
 }
 
@@ -249,7 +250,7 @@ QString journalPath(const QString& path)
 bool hasJournal(const QString& path)
 {
     struct stat found = {};
-    return ::lstat(QFile::encodeName(journalPath(path)).constData(), &found) == 0;
+    return ::lstat(pathBytes(journalPath(path)).constData(), &found) == 0;
 }
 
 QString writeInPlace(QFile& locked, const QString& path, const QByteArray& content, WriteOptions options)

@@ -1,6 +1,7 @@
 #include "platform/resources/ExResource.h"
 
 #include "platform/base/LogFile.h"
+#include "platform/os/PathName.h"
 
 #include <QFile>
 #include <QFileInfo>
@@ -52,6 +53,11 @@ QString filePath()
 Values readFile()
 {
     const QString path = filePath();
+    if (!isPlainText(qgetenv("KDD_CONFIG"))) {
+        LogFile::warnf("The settings in %s cannot be read: the name is no text",
+                       qgetenv("KDD_CONFIG").constData());
+        return {};
+    }
     // Nobody has to have a file, but one that is named is meant to be there.
     const bool isNamed = !qEnvironmentVariableIsEmpty("KDD_CONFIG");
     if (!QFileInfo::exists(path) && !isNamed)

@@ -1,6 +1,7 @@
 #include "platform/volume/KxCompressedDataMedia.h"
 
 #include "platform/base/LogFile.h"
+#include "platform/os/PathName.h"
 #include "platform/os/RandomAccessFile.h"
 #include "platform/volume/ffmpeg/VideoModule.h"
 
@@ -29,7 +30,7 @@ class FileRange : public MediaSource
 public:
     Result open(const QString& path, qint64 offset, qint64 size)
     {
-        const int error = mFile.open(QFile::encodeName(path).constData());
+        const int error = mFile.open(pathBytes(path).constData());
         if (error != 0)
             return Result::failure(QString::fromLocal8Bit(std::system_category().message(error).c_str()));
         if (offset < 0 || size <= 0 || offset >= mFile.size())

@@ -3,16 +3,23 @@
 #include "kddlib/archive/FileWalk.h"
 #include "platform/base/LogFile.h"
 #include "platform/database/Kxg.h"
+#include "platform/os/FileStatus.h"
+#include "platform/os/PathName.h"
 #include "tools/kdd/Database.h"
 
 #include <QByteArrayList>
-#include <QFileInfo>
 
 namespace Kdd
 {
 
 namespace
 {
+
+bool isThere(const QString& path)
+{
+    FileStatus status;
+    return statusOf(pathBytes(path).constData(), status);
+}
 
 /// Of the studies that a beginning fits so many are named.
 constexpr int kNamesToTell = 3;
@@ -21,7 +28,7 @@ constexpr int kNamesToTell = 3;
 
 bool resolveStudy(const QByteArray& text, QByteArray& studyUID)
 {
-    if (QFileInfo::exists(TagFile::cacheFilePathForStudy(text.constData()))) {
+    if (isThere(TagFile::cacheFilePathForStudy(text.constData()))) {
         studyUID = text;
         return true;
     }
@@ -58,9 +65,9 @@ bool readStudyFile(const QByteArray& studyUID, TagFile& file)
     if (file.readWhenFreeForStudy(studyUID.constData(), false))
         return true;
     const QString path = TagFile::cacheFilePathForStudy(studyUID.constData());
-    const QString reason = QFileInfo(path).size() == 0 && QFileInfo::exists(path)
-                               ? QStringLiteral("it is empty")
-                               : file.failure();
+    FileStatus status;
+    const bool isEmpty = statusOf(pathBytes(path).constData(), status) && status.size == 0;
+    const QString reason = isEmpty ? QStringLiteral("it is empty") : file.failure();
     LogFile::errorf("Study %s cannot be read from %s: %s", studyUID.constData(), qUtf8Printable(path),
                     qUtf8Printable(reason));
     return false;
@@ -70,7 +77,7 @@ bool readTagFile(const QString& path, TagFile& file)
 {
     if (file.readWhenFree(path, nullptr, false))
         return true;
-    if (!QFileInfo::exists(path) || file.wasLockedOut())
+    if (!isThere(path) || file.wasLockedOut())
         LogFile::errorf("Could not open %s: %s", qUtf8Printable(path), qUtf8Printable(file.failure()));
     return false;
 }
@@ -78,7 +85,7 @@ bool readTagFile(const QString& path, TagFile& file)
 QList<QByteArray> ownPlaces(const GlobalOptions& options)
 {
     QList<QByteArray> places = {absolutePath(TagFile::metaFolder()),
-                                absolutePath(options.volumeFolder().toLocal8Bit())};
+                                absolutePath(pathBytes(options.volumeFolder()))};
     const QByteArray address = Kxg::DatabaseServer();
     if (address.startsWith("sqlite:")) {
         const QByteArray database = absolutePath(address.mid(7));

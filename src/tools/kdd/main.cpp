@@ -2,10 +2,12 @@
 #include "platform/base/BuildInfo.h"
 #include "platform/base/LogFile.h"
 #include "platform/database/Kxg.h"
+#include "platform/os/PathName.h"
 #include "platform/resources/ExResource.h"
 #include "tools/kdd/CommandProgress.h"
 #include "tools/kdd/Commands.h"
 
+#include <QFile>
 #include <QStandardPaths>
 
 #include <dcmtk/config/osconfig.h>
@@ -18,6 +20,7 @@
 #include <exception>
 #include <functional>
 #include <map>
+#include <stdexcept>
 
 namespace Kdd
 {
@@ -56,9 +59,12 @@ QByteArray bytes(const std::string& text)
     return {text.data(), static_cast<int>(text.size())};
 }
 
+/// Where a name would lead to another file the command is refused.
 QString path(const std::string& text)
 {
-    return QString::fromLocal8Bit(bytes(text));
+    if (!isPlainText(bytes(text)))
+        throw std::invalid_argument("The name " + text + " is no text in the encoding of the locale");
+    return QFile::decodeName(bytes(text));
 }
 
 void addGlobalOptions(CLI::App& app, GlobalOptions& global, StoreOptions& store)
@@ -85,7 +91,7 @@ QString storeFolder(const StoreOptions& store)
 {
     return store.store.empty() ? QStandardPaths::writableLocation(QStandardPaths::GenericDataLocation) +
                                      QStringLiteral("/kdd")
-                               : path(store.store);
+                               : pathText(bytes(store.store));
 }
 
 /// The first that is not empty.
@@ -110,7 +116,7 @@ void applyLogging(const GlobalOptions& global)
 void applyStore(GlobalOptions& global, const StoreOptions& store)
 {
     global.store = storeFolder(store);
-    const QByteArray root = global.store.toLocal8Bit();
+    const QByteArray root = pathBytes(global.store);
     const QByteArray meta = firstOf({bytes(store.meta), ExResource::metaFolder(), root + "/meta"});
     Kxg::SetDatabaseServer(
         firstOf({bytes(store.database), ExResource::databaseAddress(), "sqlite:" + root + "/kdd.sqlite"}));

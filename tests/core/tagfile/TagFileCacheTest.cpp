@@ -9,6 +9,7 @@
 #include <unistd.h>
 
 #include <csignal>
+#include <filesystem>
 #include <functional>
 #include <future>
 
@@ -361,5 +362,26 @@ TEST_P(DeadWriter, OfANewFileIsFinishedToo)
 
 INSTANTIATE_TEST_SUITE_P(Deaths, DeadWriter, testing::ValuesIn(kDeaths),
                          [](const auto& row) { return std::string(row.param.name); });
+
+TEST_F(TagFileCache, TheBytesOfAFolderNameSurvive)
+{
+    const std::filesystem::path folder = mStore.folder().toStdString() + "/m\xe9ta";
+    TagFile::setMetaFolder(folder.c_str());
+    TagFile file;
+    add(file, anImage("1"));
+    ASSERT_TRUE(file.writeCacheFile());
+    TagFile more;
+    add(more, anImage("2"));
+    ASSERT_TRUE(more.mergeIntoCacheFile());
+    TagFile again;
+    ASSERT_TRUE(again.readCacheFileForStudy("1.2", true));
+    EXPECT_EQ(again.imagesByUID().size(), 2);
+    const std::filesystem::directory_iterator end;
+    EXPECT_EQ(std::distance(std::filesystem::directory_iterator(folder.parent_path()), end), 1);
+    EXPECT_TRUE(std::filesystem::exists(folder));
+    again.clear();
+    EXPECT_TRUE(again.writeCacheFile()) << "of nothing, which removes the file";
+    EXPECT_FALSE(more.readCacheFileForStudy("1.2", false));
+}
 
 }  // namespace

@@ -350,4 +350,35 @@ TEST_F(ConcurrentMerges, LoseNothingButWhatAKilledOneHadNotMerged)
     }
 }
 
+/// Labels and marks of a study and its series are theirs alone.
+TEST_F(TagFileMerge, ImagesHoldNothingThatTheirSeriesSaysOfItself)
+{
+    const DcmTagKey ofTheNode[] = {DcmTagKey(6, 0x7107), DcmTagKey(6, 0x7108), DcmTagKey(6, 0x7120)};
+    const auto mark = [&](TagFile& file) {
+        file.study()->putAndInsertInt(ofTheNode[0], 1);
+        file.seriesByUID().first()->putAndInsertInt(ofTheNode[1], 1);
+        file.createAbstractTags();
+    };
+    for (const int numFresh : {1, 9}) {
+        TagFile stored;
+        for (int i = 0; i < 4; ++i)
+            add(stored, anImage(QByteArray::number(i).constData()));
+        add(stored, anImage("s").inSeries("1.2.9"));
+        mark(stored);
+        ASSERT_TRUE(stored.writeCacheFile());
+        TagFile fresh;
+        for (int i = 0; i < numFresh; ++i)
+            add(fresh, anImage(("f" + QByteArray::number(i)).constData()));
+        mark(fresh);
+        ASSERT_TRUE(fresh.mergeIntoCacheFile());
+        for (const TagMap* image : fresh.imagesByUID()) {
+            for (const DcmTagKey& key : ofTheNode)
+                EXPECT_FALSE(image->tagsForLevel().contains(key)) << numFresh << key.toString();
+        }
+        EXPECT_NE(fresh.findImage("f0")->findElement(ofTheNode[1]), nullptr) << "it inherits the mark";
+        EXPECT_EQ(fresh.findImage("s")->findElement(ofTheNode[1]), nullptr);
+        EXPECT_TRUE(fresh.study()->tagsForLevel().contains(ofTheNode[0]));
+    }
+}
+
 }  // namespace

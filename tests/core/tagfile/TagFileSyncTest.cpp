@@ -9,6 +9,8 @@ namespace
 
 using Entry = Kxg::DicomDirectoryEntry;
 
+const DcmTagKey kFileSuffix(0x0006, 0x7101);
+const DcmTagKey kHasVolumeFile(0x0006, 0x7108);
 const DcmTagKey kAbstract(0x0006, 0x7120);
 
 /// What the database says, and two series "1.2.3" (images 1 and 2) and "1.2.4" (image 3) in the tag file.
@@ -81,6 +83,68 @@ TEST_F(TagFileSyncTest, ADatabaseThatSaysNothingRemovesNothing)
     EXPECT_EQ(file.imagesByUID().size(), 3);
 }
 
+TEST_F(TagFileSyncTest, AnImageKnownByItsPathStaysOrGoesWithItsRow)
+{
+    const auto withoutUID = [] { return anImage().without(DCM_SOPInstanceUID); };
+    add(file, withoutUID(), "D:\\old\\a.dcm");
+    add(file, withoutUID(), "/old/b");
+    listSeries("1.2.3", {{"1", "/old/1"}, {"", "D:\\old\\a.dcm"}});
+    EXPECT_TRUE(file.syncWithDatabase(study));
+    EXPECT_EQ(file.imagesByUID().keys(), (Uids{"1", "D:/old/a.dcm"}));
+    EXPECT_EQ(file.findSeries("1.2.3")->children().size(), 2);
+    EXPECT_FALSE(file.syncWithDatabase(study)) << "it is found under the path that was stored";
+    const char* uids[] = {"D:\\old\\a.dcm", "1"};
+    EXPECT_EQ(file.removeImages(2, uids), 2);
+    EXPECT_TRUE(file.isEmpty());
+}
+
+TEST_F(TagFileSyncTest, AnImageIsLetGoOfUnderWhateverKey)
+{
+    file.findImage("1")->putAndInsertString(DCM_SOPInstanceUID, "other");
+    file.findImage("1")->deleteElement(kFilePath);
+    file.findSeries("1.2.4")->putAndInsertString(DCM_SeriesInstanceUID, "other");
+    file.findImage("2")->putAndInsertValue(kFilePath, VrCode::LO, "/2");
+    file.removeImagesWithoutFilename(file.findSeries("1.2.3"));
+    EXPECT_EQ(file.imagesByUID().keys(), (Uids{"2", "3"}));
+    const char* uids[] = {"3"};
+    EXPECT_EQ(file.removeImages(1, uids), 1);
+    EXPECT_EQ(file.seriesByUID().keys(), Uids{"1.2.3"});
+}
+
+TEST_F(TagFileSyncTest, AnotherStudysEntryIsRefused)
+{
+    const LogCapture log;
+    listSeries("1.2.3", {});
+    study->studyInstanceUID = "1.9";
+    const std::string before = treeText(file);
+    EXPECT_FALSE(file.syncWithDatabase(study));
+    file.copyDatabaseValuesIntoTagMap(*study);
+    EXPECT_EQ(treeText(file), before);
+    EXPECT_EQ(log.count("1.9"), 2);
+}
+
+TEST_F(TagFileSyncTest, ASkeletonInheritsAndHidesNothing)
+{
+    file.findSeries("1.2.3")->putAndInsertInt(kHasVolumeFile, 1);
+    listSeries("1.2.7", {}).modality = "MR";
+    Kxg::SeriesInfo info;
+    info.images = {{"8", "/new/8"}};
+    bool complete = true;
+    file.copyDatabaseValuesIntoTagMap(*study);
+    file.addDicomFilePaths(file.findSeries("1.2.7"), &info, true, complete);
+    const TagMap* image = file.findImage("8");
+    for (const DcmTagKey& key : {DCM_PatientName, DCM_StudyInstanceUID})
+        EXPECT_EQ(textOf(image, key), textOf(file.findImage("1"), key));
+    EXPECT_EQ(textOf(file.findSeries("1.2.7"), DCM_Modality), "MR");
+    EXPECT_EQ(textOf(image, kFileSuffix), "") << "that of another file";
+    EXPECT_EQ(image->findElement(kHasVolumeFile), nullptr);
+    EXPECT_EQ(textOf(image->parent()->parent(), DCM_StudyInstanceUID), "1.2");
+    TagFile fresh;
+    fresh.copyDatabaseValuesIntoTagMap(*study);
+    TagFile again;
+    EXPECT_TRUE(read(again, written(fresh), "1.2")) << "a study of skeletons has its UID";
+}
+
 TEST_F(TagFileSyncTest, ReportsAreNoSeriesOfTheSkeleton)
 {
     for (const char* modality : {"SR", "PR", "SEG", "MR"})
@@ -126,6 +190,24 @@ INSTANTIATE_TEST_SUITE_P(
                     VolumeName{"a_part003.vol", {"", ""}, 1},
                     VolumeName{"a_part99999999999999.vol", {"", ""}, 1}, VolumeName{"", {"", ""}, 0}));
 
+TEST_F(TagFileSyncTest, VolumesAreNamedByTheirSuffixWhereTheNumbersHaveGaps)
+{
+    const LogCapture log;
+    TagMap* series = file.findSeries("1.2.3");
+    for (const char* suffix : {"volume", "volume_3", "volume_11"}) {
+        series->addBareVolume(new Volume(series->volumes().size()));
+        series->volumes().last()->setFileNameSuffix(suffix);
+    }
+    for (const char* name :
+         {"x-volume_part2.vol", "y-volume_part011.vol", "x-volume_part3.vol", "x-volume.vol"})
+        file.addVolumeFilePath(series, volumeFile(name), false);
+    QList<QByteArray> names;
+    for (const Volume* volume : series->volumes())
+        names.append(volume->volumeFileName());
+    EXPECT_EQ(names, (QList<QByteArray>{"x-volume.vol", "x-volume_part3.vol", "y-volume_part011.vol"}));
+    EXPECT_EQ(log.count("Volume x-volume_part2.vol not found in tag map"), 1);
+}
+
 TEST_F(TagFileSyncTest, MissingVolumesAreMadeInTheirOrder)
 {
     const LogCapture log;
@@ -138,6 +220,8 @@ TEST_F(TagFileSyncTest, MissingVolumesAreMadeInTheirOrder)
     image.type = Entry::DicomFile;
     file.addVolumeFilePath(series, image, true);
     EXPECT_EQ(series->volumes().size(), 2) << "a DICOM file is no volume";
+    file.addVolumeFilePath(series, volumeFile("a_part005.vol"), true);
+    EXPECT_EQ(series->volumes().size(), 2) << "it is there";
 }
 
 TEST_F(TagFileSyncTest, MissingImagesAreMadeOnRequest)

@@ -202,6 +202,7 @@ public:
     }
 };
 
+/// One that replaces another under its UID takes its place, as it does when the study is built anew.
 TEST_F(TagFileTree, VolumesForgetTheImagesThatGo)
 {
     TagFile file;
@@ -213,8 +214,11 @@ TEST_F(TagFileTree, VolumesForgetTheImagesThatGo)
     EXPECT_EQ(file.removeImages(1, &uid), 1);
     delete file.takeImage("2");
     add(file, anImage("3"));
-    ASSERT_EQ(volume->numImages(), 1);
-    EXPECT_EQ(volume->image(0), file.findImage("4"));
+    ASSERT_EQ(volume->numImages(), 2);
+    EXPECT_EQ(volume->image(0), file.findImage("3"));
+    EXPECT_EQ(volume->image(1), file.findImage("4"));
+    add(file, anImage("4").inSeries("1.2.4"));
+    EXPECT_EQ(volume->numImages(), 1) << "a volume is of one series";
 }
 
 }  // namespace

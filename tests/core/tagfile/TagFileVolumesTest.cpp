@@ -2,6 +2,8 @@
 #include "kddlib/volumes/Volume.h"
 #include "kddlib/volumes/VolumeInfo.h"
 
+#include <algorithm>
+
 namespace Kdd
 {
 namespace
@@ -69,6 +71,91 @@ TEST_F(TagFileVolumesTest, AnImageInSeveralVolumesListsThemByteByByte)
     EXPECT_EQ(volumes().last()->sopUIDList(), (std::vector<std::string>{"4", "3"}))
         << "slices keep the file's order";
     EXPECT_EQ(log.count("3D volume 1-volume_part003.vol contains unknown image stranger"), 1);
+}
+
+TEST_F(TagFileVolumesTest, AVolumeBelongsToOneSeries)
+{
+    const LogCapture log;
+    add(file, imageNumbered(7).inSeries("1.2.9"));
+    addVolumes({info({"1", "7", "2"})});
+    EXPECT_EQ(log.count("3D volume 1-volume.vol contains image 7 of another series, 1.2.9"), 1);
+    EXPECT_EQ(indexesOf("7"), "none");
+    const char* uids[] = {"7", "1"};
+    EXPECT_EQ(file.removeImages(2, uids), 2);
+    EXPECT_EQ(volumes().first()->sopUIDList(), std::vector<std::string>{"2.0"});
+}
+
+/// The volumes, by their suffixes, as a reader finds them: the images of their slices.
+class WrittenVolumes : public TagFileVolumesTest
+{
+protected:
+    std::string reread()
+    {
+        TagFile again;
+        EXPECT_TRUE(read(again, written(file)));
+        std::string text;
+        for (const Volume* volume : again.seriesByUID().first()->volumes()) {
+            text += volume->fileNameSuffix().toStdString() + ':';
+            for (int i = 0, frame = 0; i < volume->slices().size(); ++i) {
+                const TagMap* image = volume->imageForSlice(i, frame);
+                text += ' ' + (image != nullptr ? image->uid(TagMap::ImageLevel).toStdString() : "-");
+            }
+            text += '\n';
+        }
+        return text;
+    }
+};
+
+TEST_F(WrittenVolumes, StayRightWhenOneHasLostItsImages)
+{
+    const LogCapture log;
+    addVolumes({info({"1", "2"}, "x-a.vol"), info({"3"}, "x-b.vol"), info({"5", "4"}, "x-c.vol")});
+    const char* uids[] = {"3", "2"};
+    file.removeImages(2, uids);
+    EXPECT_EQ(reread(), "a: 1 -\nc: 5 4\n");
+    EXPECT_EQ(log.count("it has lost its last image"), 1);
+    EXPECT_EQ(volumes().size(), 2);
+}
+
+TEST_F(WrittenVolumes, StayRightWhenIndexesRepeat)
+{
+    addVolumes({info({"1", "2"}, "x-a.vol"), info({"3", "2"}, "x-b.vol")});
+    addVolumes({info({"4", "2"}, "x-c.vol"), info({"nobody"}), info({"5", "6", "5"}, "x-d.vol")});
+    EXPECT_EQ(reread(), "a: 1 2\nc: 4 2\nb: 3 2\nd: 5 6 5\n");
+    EXPECT_EQ(reread(), "a: 1 2\nc: 4 2\nb: 3 2\nd: 5 6 5\n");
+}
+
+TEST_F(WrittenVolumes, StayRightWhereOneByteCannotTellThemApart)
+{
+    std::vector<VolumeInfo> infos;
+    std::string expected;
+    for (int i = 1; i <= 300; ++i) {
+        const bool isShared = i == 7 || i == 290;
+        infos.push_back(info({isShared ? "1" : "2"}, ("x-" + std::to_string(i) + ".vol").c_str()));
+        const QByteArray uid = "a" + QByteArray::number(i);
+        add(file, imageNumbered(i).with(DCM_SOPInstanceUID, uid.constData()));
+        if (!isShared)
+            infos.back().imageUIDs = {uid.toStdString()};
+        (isShared ? expected.insert(i == 7 ? 0 : 5, std::to_string(i) + ": 1\n")
+                  : expected += std::to_string(i) + ": " + uid.toStdString() + '\n');
+    }
+    addVolumes(infos);
+    EXPECT_EQ(reread(), expected);
+}
+
+TEST_F(WrittenVolumes, AreLeftOutWhenNoByteIsLeft)
+{
+    const LogCapture log;
+    std::vector<VolumeInfo> infos;
+    for (int i = 0; i < 257; ++i)
+        infos.push_back(info({"1"}, ("x-" + std::to_string(i) + ".vol").c_str()));
+    addVolumes(infos);
+    ASSERT_EQ(volumes().size(), 257);
+    const std::string text = reread();
+    EXPECT_EQ(std::count(text.begin(), text.end(), '\n'), 256);
+    EXPECT_EQ(text.find("256: "), std::string::npos);
+    EXPECT_NE(text.find("255: 1\n"), std::string::npos);
+    EXPECT_EQ(log.count("Volume 256 of series 1.2.3 is left out of the tag file"), 1);
 }
 
 TEST_F(TagFileVolumesTest, VolumesAndTheirImagesComeBackFromTheFile)

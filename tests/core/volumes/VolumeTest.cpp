@@ -34,8 +34,6 @@ protected:
     }
 
     OpenVolume volume;
-
-private:
     std::vector<std::unique_ptr<TagMap>> mImages;
 };
 
@@ -61,7 +59,8 @@ TEST_F(VolumeTest, FramesNameTheSortedImagesAndElseSlicesKeepTheirOrder)
     EXPECT_EQ(frame, 3);
     for (const int unknown : {2, 7, -1})
         EXPECT_EQ(volume.imageForSlice(unknown, frame), nullptr) << unknown;
-    volume.forgetImage(volume.image(1));
+    ASSERT_EQ(mImages.front().get(), volume.image(1));
+    mImages.erase(mImages.begin());
     EXPECT_EQ(volume.sopUIDList(), (UIDs{"1.1.0", "1.1.0", "local.0"}));
 }
 

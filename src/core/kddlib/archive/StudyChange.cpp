@@ -7,8 +7,8 @@
 #include "kddlib/tagfile/TagFile.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
-
-#include <QFileInfo>
+#include "platform/os/FileStatus.h"
+#include "platform/os/PathName.h"
 
 #include <algorithm>
 
@@ -73,7 +73,9 @@ bool failChanging(const QByteArray& studyUID, const TagFile& file)
 bool removeUnregistered(const ArchiveNode& node)
 {
     TagFile file;
-    if (!QFileInfo::exists(TagFile::cacheFilePathForStudy(node.study.constData())))
+    FileStatus status;
+    const QString path = TagFile::cacheFilePathForStudy(node.study.constData());
+    if (!statusOf(pathBytes(path).constData(), status))
         return failAbsent(node);
     if (!file.readWhenFreeForStudy(node.study.constData(), true))
         return failChanging(node.study, file);

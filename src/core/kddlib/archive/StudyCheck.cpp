@@ -2,6 +2,7 @@
 
 #include "kddlib/archive/ArchiveDatabase.h"
 #include "kddlib/archive/DatasetVerifier.h"
+#include "kddlib/archive/FileWalk.h"
 #include "kddlib/archive/WorkObserver.h"
 #include "kddlib/net/KxDcmFileLoader.h"
 #include "kddlib/tagfile/StudyRecord.h"
@@ -9,9 +10,9 @@
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/Volume.h"
+#include "platform/os/FileStatus.h"
+#include "platform/os/PathName.h"
 
-#include <QDirIterator>
-#include <QFileInfo>
 #include <QSet>
 
 #include <dcmtk/dcmdata/dcfilefo.h>
@@ -26,16 +27,16 @@ namespace
 
 QString textOf(const QByteArray& bytes)
 {
-    return QString::fromLocal8Bit(bytes);
+    return pathText(bytes);
 }
 
 /// Why a study's tag file cannot be read, more plainly than the reader can tell.
 QString reasonOf(const QString& path, const TagFile& tried)
 {
-    const QFileInfo info(path);
-    if (!info.exists())
+    FileStatus status;
+    if (!statusOf(pathBytes(path).constData(), status))
         return QStringLiteral("has no tag file");
-    if (info.size() == 0)
+    if (status.size == 0)
         return QStringLiteral("has an empty tag file, %1").arg(path);
     TagFile any;
     if (any.readCacheFile(path, nullptr, false))
@@ -44,16 +45,23 @@ QString reasonOf(const QString& path, const TagFile& tried)
     return QStringLiteral("has a tag file, %1, that cannot be read: %2").arg(path, tried.failure());
 }
 
+bool isThere(const QString& path)
+{
+    FileStatus status;
+    return statusOf(pathBytes(path).constData(), status);
+}
+
 QByteArray baseName(const QByteArray& path)
 {
     return path.mid(path.lastIndexOf('/') + 1);
 }
 
 /// By what volumes are known in a tag file: the end of their file's name, or all of it after a sync.
-bool isVolumeOf(const QByteArray& fileName, const QByteArray& path)
+bool isVolumeOf(const Volume& volume, const QByteArray& path)
 {
     const QByteArray base = baseName(path);
-    return fileName == base || fileName == Volume::fileNameSuffix(base);
+    return volume.volumeFileName() == base ||
+           volume.fileNameSuffix() == Volume::fileNameSuffix(base.constData());
 }
 
 }  // namespace
@@ -87,11 +95,12 @@ void StudyCheck::checkAll()
         known.insert(TagFile::cacheFilePathForStudy(study.studyInstanceUID.constData()));
     }
     QStringList others;
-    QDirIterator files(QString::fromLocal8Bit(TagFile::metaFolder()), {QStringLiteral("*.tc")}, QDir::Files,
-                       QDirIterator::Subdirectories);
-    while (files.hasNext()) {
-        const QString path = files.next();
-        if (!known.contains(path))
+    QStringList faults;
+    const QString meta = pathText(TagFile::metaFolder());
+    const QByteArray folder = absolutePath(TagFile::metaFolder());
+    for (const QByteArray& file : filesBelow({folder}, faults)) {
+        const QString path = meta + pathText(file.mid(folder.size() + 1));
+        if (file.endsWith(".tc") && !known.contains(path))
             others.append(path);
     }
     others.sort();
@@ -130,7 +139,7 @@ bool StudyCheck::read(const QByteArray& studyUID, TagFile& file)
         return true;
     // One that waits to be built for the first time has none yet, which was told.
     const QString path = TagFile::cacheFilePathForStudy(studyUID.constData());
-    if (!mContents.isWaiting || QFileInfo::exists(path)) {
+    if (!mContents.isWaiting || isThere(path)) {
         ++mFindings.unreadable;
         mReport(QStringLiteral("Study %1 %2").arg(textOf(studyUID), reasonOf(path, file)));
     }
@@ -174,10 +183,11 @@ void StudyCheck::checkVolumes(const QByteArray& studyUID, const TagFile& file)
     QSet<QByteArray> found;
     for (const TagMap* series : file.seriesByUID()) {
         for (const Volume* volume : series->volumes()) {
-            const QByteArray name = volume->volumeFileName();
+            const QByteArray name =
+                volume->volumeFileName().isEmpty() ? volume->fileNameSuffix() : volume->volumeFileName();
             const auto& paths = mContents.volumes;
             const auto path = std::find_if(paths.begin(), paths.end(), [&](const QByteArray& each) {
-                return !found.contains(each) && isVolumeOf(name, each);
+                return !found.contains(each) && isVolumeOf(*volume, each);
             });
             if (path != paths.end())
                 found.insert(*path);
@@ -225,9 +235,10 @@ void StudyCheck::checkUnknown(const QString& path)
     TagFile file;
     if (!file.readCacheFile(path, nullptr, false)) {
         ++mFindings.unreadable;
-        mReport(QFileInfo(path).size() == 0
-                    ? QStringLiteral("The tag file %1 is empty").arg(path)
-                    : QStringLiteral("The tag file %1 cannot be read: %2").arg(path, file.failure()));
+        FileStatus status;
+        const bool isEmpty = statusOf(pathBytes(path).constData(), status) && status.size == 0;
+        mReport(isEmpty ? QStringLiteral("The tag file %1 is empty").arg(path)
+                        : QStringLiteral("The tag file %1 cannot be read: %2").arg(path, file.failure()));
         return;
     }
     const QString study = textOf(file.studyInstanceUID());

@@ -1,6 +1,7 @@
 #include "kddlib/archive/StudyStacker.h"
 
 #include "kddlib/archive/ArchiveDatabase.h"
+#include "kddlib/archive/FileWalk.h"
 #include "kddlib/archive/StudyCompletion.h"
 #include "kddlib/tagfile/TagFile.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
@@ -8,9 +9,9 @@
 #include "kddlib/volumes/StackWriter.h"
 #include "platform/base/LogFile.h"
 #include "platform/os/FileStatus.h"
+#include "platform/os/PathName.h"
 
-#include <QDir>
-#include <QFile>
+#include <unistd.h>
 
 #include <utility>
 
@@ -24,8 +25,9 @@ namespace
 QString folderOf(const QByteArray& studyUID, const QString& volumes)
 {
     const QString tagFile = TagFile::cacheFilePathForStudy(studyUID.constData());
-    const QString place = tagFile.mid(QString::fromLocal8Bit(TagFile::metaFolder()).size());
-    return QDir(volumes).absoluteFilePath(place.left(place.lastIndexOf(QLatin1Char('.'))));
+    const QString place = tagFile.mid(pathText(TagFile::metaFolder()).size());
+    return pathText(absolutePath(pathBytes(volumes))) + QLatin1Char('/') +
+           place.left(place.lastIndexOf(QLatin1Char('.')));
 }
 
 }  // namespace
@@ -75,10 +77,11 @@ bool StudyStacker::run()
 /// What a process that died while it wrote has left. The claim says that nobody writes there now.
 void StudyStacker::removeUnfinished() const
 {
-    QDir folder(mFolder);
-    const QStringList unfinished = folder.entryList({QStringLiteral("*.part")}, QDir::Files);
-    for (const QString& name : unfinished)
-        folder.remove(name);
+    QStringList faults;  // mostly there is no such folder
+    for (const QByteArray& path : filesBelow({pathBytes(mFolder)}, faults)) {
+        if (path.endsWith(".part"))
+            ::unlink(path.constData());
+    }
 }
 
 bool StudyStacker::stackSeries(const QByteArray& seriesUID, const TagMap& series)
@@ -120,13 +123,13 @@ bool StudyStacker::clearSeries(const QByteArray& seriesUID, const TagMap& series
         return false;
     mIsChanged = true;
     for (const QByteArray& path : ours)
-        QFile::remove(QString::fromLocal8Bit(path));
+        ::unlink(path.constData());
     return true;
 }
 
 bool StudyStacker::writeVolume(const QByteArray& seriesUID, const Stack& stack, int index)
 {
-    if (!QDir().mkpath(mFolder)) {
+    if (!makeFolder(mFolder)) {
         LogFile::errorf("Could not create folder %s", qUtf8Printable(mFolder));
         return false;
     }
@@ -140,7 +143,7 @@ bool StudyStacker::writeVolume(const QByteArray& seriesUID, const Stack& stack, 
 
 QByteArray StudyStacker::volumePath(const QByteArray& seriesUID, int index) const
 {
-    return QDir(mFolder).filePath(QString::fromLocal8Bit(volumeFileName(seriesUID, index))).toLocal8Bit();
+    return pathBytes(mFolder) + '/' + volumeFileName(seriesUID, index);
 }
 
 }  // namespace Kdd

@@ -4,10 +4,11 @@
 #include "kddlib/tagfile/TagFile.h"
 #include "platform/base/LogFile.h"
 #include "platform/database/Kxg.h"
+#include "platform/os/FileStatus.h"
+#include "platform/os/PathName.h"
 #include "platform/os/SystemLog.h"
 
 #include <QDataStream>
-#include <QFile>
 
 #include <memory>
 
@@ -34,6 +35,12 @@ void configureLogging(int flags, const char* databaseServer)
         LogFile::printf("Configure logging: debug=%d timings=%d", 1, hasTimings ? 1 : 0);
 }
 
+bool isThere(const QString& path)
+{
+    FileStatus status;
+    return statusOf(pathBytes(path).constData(), status);
+}
+
 using Removal = int (TagFile::*)(int count, const char** uids);
 
 /// Removes part of a study from its tag file, `what` for the log.
@@ -41,7 +48,7 @@ bool removeFrom(const char* studyUID, int count, const char** uids, Removal remo
 {
     TagFile file;
     if (!file.readCacheFileForStudy(studyUID, true)) {
-        if (QFile::exists(TagFile::cacheFilePathForStudy(studyUID)))
+        if (isThere(TagFile::cacheFilePathForStudy(studyUID)))
             LogFile::errorf("Could not remove %s from the tag file of study %s: %s", what, studyUID,
                             qUtf8Printable(file.failure()));
         // From a damaged file nobody is shown anything; from one that others hold the images would be.

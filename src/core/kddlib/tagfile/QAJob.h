@@ -12,9 +12,6 @@
 namespace Kdd
 {
 
-/// What a study or a series says of itself and its images only inherit.
-const QVector<DcmTagKey>& attributesOfTheNode();
-
 /// Whether an image with another value of the attribute belongs to another place.
 bool movesImages(const DcmTagKey& key);
 

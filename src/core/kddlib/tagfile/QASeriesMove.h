@@ -17,7 +17,7 @@ struct QASeriesMove
 {
     struct Stack
     {
-        Volume volume;  ///< its pointers to images are not to be followed
+        Volume volume;  ///< without its images
         QVector<QByteArray> images;
     };
 

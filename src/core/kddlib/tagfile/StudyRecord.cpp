@@ -5,9 +5,10 @@
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/os/JournaledWrite.h"
+#include "platform/os/PathName.h"
+#include "platform/os/RandomAccessFile.h"
 
 #include <QCryptographicHash>
-#include <QFile>
 #include <QMultiMap>
 
 #include <dcmtk/dcmdata/dcdeftag.h>
@@ -93,12 +94,12 @@ Kxg::BuiltStudy builtStudy(const TagFile& file)
 
 bool isTagFile(const QString& path, const Kxg::TagFileStamp& stamp)
 {
-    QFile file(path);
-    if (stamp.digest.isEmpty() || hasJournal(path) || !file.open(QIODevice::ReadOnly) ||
+    RandomAccessFile file;
+    if (stamp.digest.isEmpty() || hasJournal(path) || file.open(pathBytes(path).constData()) != 0 ||
         file.size() < stamp.size)
         return false;
-    const QByteArray content = file.read(stamp.size);
-    return content.size() == stamp.size &&
+    QByteArray content(static_cast<int>(stamp.size), Qt::Uninitialized);
+    return file.readAt(0, content.data(), content.size()) == content.size() &&
            QCryptographicHash::hash(content, QCryptographicHash::Md5) == stamp.digest;
 }
 

@@ -3,6 +3,7 @@
 #include "kddlib/Limits.h"
 #include "kddlib/items/FileNaming.h"
 #include "kddlib/net/KxDcmFileLoader.h"
+#include "kddlib/tagfile/NodeAttributes.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
@@ -14,6 +15,7 @@
 #include <dcmtk/dcmdata/dcdeftag.h>
 #include <dcmtk/dcmdata/dcfilefo.h>
 
+#include <algorithm>
 #include <mutex>
 #include <tuple>
 
@@ -72,24 +74,25 @@ void TagFile::setMetaFolder(const char* path)
         LogFile::printf("Meta folder set to %s", sMetaFolder.constData());
 }
 
-/// The name under which an image is indexed: its SOP Instance UID, and where it has none its file path.
+/// The name under which an image is indexed: its SOP Instance UID, and where it has none its file path, in the form in
+/// which the database's paths are kept.
 QByteArray TagFile::imageKey(const TagMap& image)
 {
     const QByteArray sopUID = image.uid(TagMap::ImageLevel);
-    return sopUID.isEmpty() ? filePathOf(image) : sopUID;
+    return sopUID.isEmpty() ? forwardSlashes(filePathOf(image)) : sopUID;
 }
 
 TagMap* TagFile::addTagMap(TagMap* map, const char* path, bool replace)
 {
     std::unique_ptr<TagMap> image(map);
     // The path may be what the image says that is about to be replaced.
-    const QByteArray pathText(path);
+    const QByteArray givenPath(path);
     const QByteArray studyUID = image->uid(TagMap::StudyLevel);
     const QByteArray seriesUID = image->uid(TagMap::SeriesLevel);
     QByteArray key = imageKey(*image);
     const bool isKnownByPath = key.isEmpty() && path != nullptr;
     if (isKnownByPath)
-        key = pathText;
+        key = forwardSlashes(givenPath);
     if (key.isEmpty() || (!mStudies.isEmpty() && mStudies.firstKey() != studyUID))
         return nullptr;
     if (TagMap* old = mImages.find(key)) {
@@ -97,38 +100,44 @@ TagMap* TagFile::addTagMap(TagMap* map, const char* path, bool replace)
             return image.release();
         if (!replace)
             return nullptr;
-        replaceImage(old);
+        replaceImage(old, *image, seriesUID);
     }
+    dropOfTheNode(*image);
     mImages.insert(key, image.get());
     placeInSeries(image.get(), seriesUID, studyUID);
     if (path != nullptr)
-        image->putAndInsertValue(kFileSuffix, VrCode::LO, extractSuffix(pathText.constData()));
+        image->putAndInsertValue(kFileSuffix, VrCode::LO, extractSuffix(givenPath.constData()));
     if (isKnownByPath)
-        image->putAndInsertValue(kFilePath, VrCode::LO, pathText);
+        image->putAndInsertValue(kFilePath, VrCode::LO, givenPath);
     return image.release();
 }
 
-void TagFile::replaceImage(TagMap* old)
+/// In its series the new image takes the old one's places in the volumes, which know their images by UID.
+void TagFile::replaceImage(TagMap* old, TagMap& image, const QByteArray& seriesUID)
 {
     TagMap* series = old->parent();
+    const bool staysInSeries = series != nullptr && series == findSeries(seriesUID);
+    if (staysInSeries)
+        image.takeVolumePlaces(*old);
     delete old;
-    if (series != nullptr && series->children().isEmpty())
+    if (series != nullptr && series->children().isEmpty() && !staysInSeries)
         dropSeries(series);
 }
 
 void TagFile::placeInSeries(TagMap* image, const QByteArray& seriesUID, const QByteArray& studyUID)
 {
     if (TagMap* series = mSeries.value(seriesUID, nullptr)) {
-        series->addChildMap(image, TagMap::ImageLevel);
+        attachBelow(*series, image, TagMap::ImageLevel);
         return;
     }
     auto* series = new TagMap;
     mSeries.insert(seriesUID, series);
-    series->addChildMap(image, TagMap::ImageLevel);
+    attachBelow(*series, image, TagMap::ImageLevel);
     std::shared_ptr<TagMap>& study = mStudies[studyUID];
     if (study == nullptr)
         study = std::make_shared<TagMap>();
-    study->addChildMap(series, TagMap::SeriesLevel);
+    holdInSeries(*study);
+    attachBelow(*study, series, TagMap::SeriesLevel);
 }
 
 TagMap* TagFile::addDataset(DcmDataset* dataset, const char* path, bool replace)
@@ -154,7 +163,9 @@ TagMap* TagFile::findSeries(const QByteArray& seriesUID) const
 
 TagMap* TagFile::findImage(const QByteArray& sopUID) const
 {
-    return mImages.find(sopUID);
+    TagMap* image = mImages.find(sopUID);
+    // The path of an image without UID, as it was given.
+    return image != nullptr || !sopUID.contains('\\') ? image : mImages.find(forwardSlashes(sopUID));
 }
 
 TagMap* TagFile::findImage(const QByteArray& sopUID, const QByteArray& suffix) const
@@ -168,10 +179,11 @@ TagMap* TagFile::findImage(const QByteArray& sopUID, const QByteArray& suffix) c
 
 TagMap* TagFile::takeImage(const QByteArray& sopUID)
 {
-    TagMap* image = mImages.take(sopUID);
+    TagMap* image = findImage(sopUID);
     if (image == nullptr)
         return nullptr;
     TagMap* copy = image->clone();
+    mImages.remove(image, sopUID);
     delete image;
     return copy;
 }
@@ -184,7 +196,7 @@ int TagFile::removeImages(int count, const char** sopUIDs)
         TagMap* series = image != nullptr ? image->parent() : nullptr;
         if (series == nullptr)
             continue;
-        mImages.take(sopUID);
+        mImages.remove(image, sopUID);
         delete image;
         ++removed;
         TagMap* study = series->parent();
@@ -203,8 +215,8 @@ int TagFile::removeSeries(int count, const char** seriesUIDs)
         TagMap* series = findSeries(seriesUID);
         if (series == nullptr)
             continue;
-        for (const TagMap* image : series->children())
-            mImages.take(imageKey(*image));
+        for (TagMap* image : series->children())
+            mImages.remove(image, imageKey(*image));
         TagMap* study = series->parent();
         dropSeries(series);
         ++removed;
@@ -225,21 +237,26 @@ void TagFile::removeImagesWithoutFilename(TagMap* series)
 
 void TagFile::dropImage(TagMap* image)
 {
-    mImages.take(imageKey(*image));
+    mImages.remove(image, imageKey(*image));
     delete image;
 }
 
-/// A node that is deleted takes itself out of its parent.
+/// A node that is deleted takes itself out of its parent. What it says of its UID may have changed since it was indexed.
 void TagFile::dropSeries(TagMap* series)
 {
-    mSeries.remove(series->uid(TagMap::SeriesLevel));
+    const QByteArray uid = series->uid(TagMap::SeriesLevel);
+    mSeries.remove(mSeries.value(uid, nullptr) == series ? uid : mSeries.key(series));
     delete series;
 }
 
 void TagFile::dropStudyIfEmpty(TagMap* study)
 {
-    if (study->children().isEmpty())
-        mStudies.remove(study->uid(TagMap::StudyLevel));
+    if (!study->children().isEmpty())
+        return;
+    const auto holds = [study](const std::shared_ptr<TagMap>& each) { return each.get() == study; };
+    const auto at = std::find_if(mStudies.begin(), mStudies.end(), holds);
+    if (at != mStudies.end())
+        mStudies.erase(at);
 }
 
 void TagFile::deleteEmptyNodes()

@@ -190,7 +190,9 @@ public:
     bool writeCacheFile();
     bool writeCacheFile(const char* path);
 
-    /// Writes to a stream. False, with nothing written, when the study holds what its reader would refuse or lose.
+    /// Writes to a stream. False, with nothing written, when the study holds what its reader would refuse or lose, among
+    /// that images of so many volumes that the format cannot tell them apart. A volume that lost all its images goes
+    /// before any write.
     bool writeCacheFile(QDataStream& out);
 
     /// Brings the images held here into the study's file, in place of images with the same UID, while the file is
@@ -200,8 +202,9 @@ public:
 
     // ---- volumes
 
-    /// Adds the volumes of one series, whose indexes are their places in `infos`. Images that are not held are warned
-    /// about and passed over; a volume none of whose images is held is not made.
+    /// Adds the volumes of one series, whose indexes are their places in `infos`. Images that are not held, or belong
+    /// to another series than the volume's first one, are warned about and passed over; a volume none of whose images
+    /// is held is not made.
     void addVolumeInfo(const std::vector<VolumeInfo*>& infos);
 
     /// Called when a study's volumes are complete; there is nothing left to do then.
@@ -249,8 +252,8 @@ public:
     /// false, or are made with `createMissing`. How many images received a path.
     int addDicomFilePaths(TagMap* series, const Kxg::SeriesInfo* info, bool createMissing, bool& complete);
 
-    /// Gives the volume that a volume file's name stands for that name; `createMissing` makes the volume first. Other
-    /// entries change nothing.
+    /// Gives the volume that a volume file's name stands for that name: the one of its suffix, else of its part number.
+    /// `createMissing` makes a volume that is not there. Other entries change nothing.
     static void addVolumeFilePath(TagMap* series, const Kxg::DicomDirectoryEntry& entry, bool createMissing);
 
     /// Marks the study as known to the database, and adds an empty series for each one that only the database has but
@@ -266,7 +269,8 @@ public:
     bool readAndSync(const char* studyUID, const char* user);
 
     /// Brings the tree into line with what the database says of the study: file paths, volume names, series that are
-    /// gone. Whether anything changed.
+    /// gone. An image that a correction moved here or renamed stays. Another study's entry is refused. Whether anything
+    /// changed.
     bool syncWithDatabase(const std::shared_ptr<Kxg::DicomDirectoryEntry>& study);
 
     /// Of the file that this object wrote last; empty before.
@@ -306,6 +310,12 @@ private:
             return mInOrder.take(uid);
         }
 
+        /// Lets go of an image, by its key if it still stands under that: what the key was made from may have changed.
+        void remove(TagMap* image, const QByteArray& key)
+        {
+            take(find(key) == image ? key : mInOrder.key(image));
+        }
+
     private:
         NodeIndex mInOrder;
         QHash<QByteArray, TagMap*> mHashed;
@@ -320,23 +330,30 @@ private:
 
     class BodyReader;
     class BodyWriter;
+    class DatabaseView;
     class QAJob;
     class QAVolumes;
 
     static QByteArray imageKey(const TagMap& image);
-    void replaceImage(TagMap* old);
+    void replaceImage(TagMap* old, TagMap& image, const QByteArray& seriesUID);
     void placeInSeries(TagMap* image, const QByteArray& seriesUID, const QByteArray& studyUID);
     void dropSeries(TagMap* series);
     void dropImage(TagMap* image);
     void dropStudyIfEmpty(TagMap* study);
     static void forgetUnseen(TagMap& node);
 
-    TagMap* makeImage(TagMap* series, const QByteArray& sopUID);
+    TagMap* makeImage(TagMap* series, const Kxg::ImageFile& file);
     TagMap* findImage(const Kxg::ImageFile& file) const;
     bool syncSeries(TagMap& series, const Kxg::DicomDirectoryEntry& entry);
-    bool syncImages(TagMap& series, const Kxg::SeriesInfo& info);
+    bool removeUnlisted(const DatabaseView& view);
 
     QVector<TagMap*> imagesOf(const VolumeInfo& info, int volumeIndex) const;
+
+    /// Makes sure that a reader will rebuild the same images for each slice of every volume; a volume that lost its last
+    /// image goes. Else the reason, with the images of every volume as they were.
+    static QString settleVolumes(TagMap& series);
+    static void renumberVolumes(TagMap& series);
+    static void releaseImagesOfOthers(const TagMap& series);
 
     bool write(QDataStream& out, CompressionMode mode);
     QByteArray serialized(CompressionMode mode);

@@ -4,11 +4,11 @@
 #include "platform/base/Stopwatch.h"
 #include "platform/os/ExclusiveFile.h"
 #include "platform/os/JournaledWrite.h"
+#include "platform/os/PathName.h"
 #include "platform/resources/ExResource.h"
 
 #include <QCryptographicHash>
 #include <QDataStream>
-#include <QDir>
 #include <QFileInfo>
 
 #include <cerrno>
@@ -34,7 +34,7 @@ QString TagFile::cacheFilePathForStudy(const char* studyUID)
 {
     const QByteArray hash =
         QCryptographicHash::hash(QByteArray(studyUID) + '\n', QCryptographicHash::Md5).toHex();
-    return QString::fromLocal8Bit(metaFolder()) +
+    return pathText(metaFolder()) +
            QString::fromLatin1(hash.left(2) + '/' + hash.mid(2, 2) + '/' + hash.mid(4) + ".tc");
 }
 
@@ -152,7 +152,7 @@ bool TagFile::holdStudy(const QByteArray& studyUID, IfAbsent ifAbsent)
     const QString path = cacheFilePathForStudy(studyUID.constData());
     mCacheFilePath = path;
     if (ifAbsent == IfAbsent::Create)
-        QDir().mkpath(QFileInfo(path).path());
+        makeFolder(QFileInfo(path).path());
     const LockedOpenResult opened =
         openLockedFile(mCacheFile, path, FileLock::Exclusive, ifAbsent, kReadPolling);
     mLockedOut = false;
@@ -200,12 +200,12 @@ bool TagFile::writeCacheFile()
 bool TagFile::writeCacheFile(const char* path)
 {
     mFailure.clear();
-    return createAndWrite(QString::fromLocal8Bit(path));
+    return createAndWrite(pathText(path));
 }
 
 bool TagFile::createAndWrite(const QString& path)
 {
-    QDir().mkpath(QFileInfo(path).path());
+    makeFolder(QFileInfo(path).path());
     QFile file;
     const LockedOpenResult opened =
         openLockedFile(file, path, FileLock::Exclusive, IfAbsent::Create, kWritePolling);

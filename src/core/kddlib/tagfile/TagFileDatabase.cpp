@@ -1,11 +1,13 @@
+#include "kddlib/tagfile/NodeAttributes.h"
 #include "kddlib/tagfile/TagFile.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/Volume.h"
-#include "kddlib/volumes/VolumeFileName.h"
+#include "kddlib/volumes/VolumeLookup.h"
 #include "platform/base/LogFile.h"
 #include "platform/database/DirectoryEntry.h"
+#include "platform/volumefile/VolumeFileName.h"
 
 #include <QHash>
 #include <QSet>
@@ -54,12 +56,21 @@ TagMap* makeSeries(const Kxg::DicomDirectoryEntry& entry)
     return series;
 }
 
+/// An image without SOP Instance UID is known by its path.
+QByteArray keyOf(const Kxg::ImageFile& file)
+{
+    return file.sopInstanceUID.isEmpty() ? forwardSlashes(file.path) : file.sopInstanceUID;
+}
+
 bool showsPixels(const TagMap* image)
 {
     return image->findElement(DCM_PixelData) != nullptr ||
            image->findElement(DCM_FloatPixelData) != nullptr ||
            image->findElement(DCM_DoubleFloatPixelData) != nullptr;
 }
+
+/// What an image says of its own file. As long as a series holds it for all its images, another one would inherit it.
+const DcmTagKey kOfTheFile[] = {kFileSuffix, kTransferSyntax, kVolumeIndex, kPreview};
 
 /// A series as the user knows it: its number and what it shows.
 QByteArray labelOf(const TagMap& series)
@@ -82,10 +93,9 @@ QByteArray labelOf(const TagMap& series)
 
 }  // namespace
 
-/// An image without SOP Instance UID is known by its path.
 TagMap* TagFile::findImage(const Kxg::ImageFile& file) const
 {
-    return findImage(file.sopInstanceUID.isEmpty() ? file.path : file.sopInstanceUID);
+    return findImage(keyOf(file));
 }
 
 int TagFile::addDicomFilePaths(TagMap* series, const Kxg::SeriesInfo* info, bool createMissing,
@@ -95,25 +105,30 @@ int TagFile::addDicomFilePaths(TagMap* series, const Kxg::SeriesInfo* info, bool
     for (const Kxg::ImageFile& file : info != nullptr ? info->images : std::vector<Kxg::ImageFile>()) {
         TagMap* image = findImage(file);
         if (image == nullptr && createMissing)
-            image = makeImage(series, file.sopInstanceUID);
+            image = makeImage(series, file);
         if (image == nullptr) {
-            LogFile::warnf("Image %s not found in tag map", file.sopInstanceUID.constData());
+            LogFile::warnf("Image %s not found in tag map", keyOf(file).constData());
             complete = false;
             continue;
         }
-        image->putAndInsertValue(kFilePath, VrCode::LO, QByteArray(file.path).replace('\\', '/'));
+        image->putAndInsertValue(kFilePath, VrCode::LO, forwardSlashes(file.path));
         ++count;
     }
     return count;
 }
 
-TagMap* TagFile::makeImage(TagMap* series, const QByteArray& sopUID)
+TagMap* TagFile::makeImage(TagMap* series, const Kxg::ImageFile& file)
 {
+    for (const DcmTagKey& key : kOfTheFile) {
+        if (series->tagsForLevel().contains(key))
+            series->storeOptionA(key);
+    }
     auto* image = new TagMap;
-    image->putAndInsertString(DCM_SOPInstanceUID, sopUID);
+    if (!file.sopInstanceUID.isEmpty())
+        image->putAndInsertString(DCM_SOPInstanceUID, file.sopInstanceUID);
     image->markAsOmitted(DCM_PixelData);
-    series->addChildMap(image, TagMap::ImageLevel);
-    mImages.insert(sopUID, image);
+    series->appendChild(image);
+    mImages.insert(keyOf(file), image);
     return image;
 }
 
@@ -124,14 +139,16 @@ void TagFile::addVolumeFilePath(TagMap* series, const Kxg::DicomDirectoryEntry& 
     const int index = isVolume ? volumeIndexOf(entry.name) : -1;
     if (index < 0)
         return;
-    if (createMissing) {
+    Volume* volume = volumeOfFile(*series, entry.name, index);
+    if (volume == nullptr && createMissing) {
         if (index != series->volumes().size())
             LogFile::warnf("Invalid volume index %d (expected %d) for %s", index, series->volumes().size(),
                            entry.name.constData());
-        series->addBareVolume(new Volume(index));
+        volume = new Volume(index);
+        series->addBareVolume(volume);
     }
-    if (index < series->volumes().size())
-        series->volumes().at(index)->setVolumeFileName(entry.name);
+    if (volume != nullptr)
+        volume->setVolumeFileName(entry.name);
     else
         LogFile::warnf("Volume %s not found in tag map", entry.name.constData());
 }
@@ -140,6 +157,11 @@ void TagFile::addVolumeFilePath(TagMap* series, const Kxg::DicomDirectoryEntry& 
 /// only a few of them.
 void TagFile::copyDatabaseValuesIntoTagMap(const Kxg::DicomDirectoryEntry& entry)
 {
+    if (!isEmpty() && studyInstanceUID() != entry.studyInstanceUID) {
+        LogFile::errorf("What the database says of study %s is no part of study %s",
+                        entry.studyInstanceUID.constData(), studyInstanceUID().constData());
+        return;
+    }
     std::shared_ptr<TagMap>& study = mStudies[entry.studyInstanceUID];
     if (study == nullptr) {
         study = std::make_shared<TagMap>();
@@ -150,7 +172,8 @@ void TagFile::copyDatabaseValuesIntoTagMap(const Kxg::DicomDirectoryEntry& entry
         if (isHidden(series.modality) || mSeries.contains(series.seriesInstanceUID))
             continue;
         TagMap* made = makeSeries(series);
-        study->addChildMap(made, TagMap::SeriesLevel);
+        holdInSeries(*study);
+        study->appendChild(made);
         mSeries.insert(series.seriesInstanceUID, made);
     }
 }

@@ -180,8 +180,7 @@ private:
     TagMap* readBelow(KxMsg& record, TagMap* parent)
     {
         auto* node = new TagMap;
-        node->mParent = parent;
-        parent->mChildren.append(node);
+        parent->appendChild(node);
         node->deserialize(record, parent, mContext);
         return node;
     }

@@ -1,12 +1,14 @@
+#include "kddlib/tagfile/NodeAttributes.h"
 #include "kddlib/tagfile/TagFile.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
+#include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
 #include "platform/os/ExclusiveFile.h"
 #include "platform/os/JournaledWrite.h"
+#include "platform/os/PathName.h"
 
 #include <QDataStream>
-#include <QDir>
 #include <QFileInfo>
 
 #include <algorithm>
@@ -25,6 +27,14 @@ constexpr LockPolling kMergePolling{100, 20};
 bool isLabelled(const TagMap* series)
 {
     return series->findElement(kAbstract) != nullptr;
+}
+
+/// The mark was made by whoever built the file from the database, which knows more than the images tell.
+void keepVolumeFileMark(const TagMap& from, TagMap& to)
+{
+    const TagElement* mark = from.findElement(kHasVolumeFile);
+    if (mark != nullptr && to.findElement(kHasVolumeFile) == nullptr)
+        to.putElement(kHasVolumeFile, mark->clone());
 }
 
 }  // namespace
@@ -61,8 +71,8 @@ bool TagFile::openForMerge(QFile& file, const QString& path)
         openLockedFile(file, path, FileLock::Exclusive, IfAbsent::Create, kMergePolling);
     const QString folder = QFileInfo(path).path();
     // Another process may make the folder between the two questions, so what was not found is tried again anyhow.
-    if (opened.failure == OpenFailure::NotFound || (!opened && !QDir(folder).exists())) {
-        if (!QDir().mkpath(folder))
+    if (!opened && opened.failure != OpenFailure::Locked) {
+        if (!makeFolder(folder))
             return failMerge(QString::asprintf("Could not create meta folder %s", qUtf8Printable(folder)));
         opened = openLockedFile(file, path, FileLock::Exclusive, IfAbsent::Create, kMergePolling);
     }
@@ -86,7 +96,7 @@ bool TagFile::readForMerge(QFile& file, const QString& path, const QByteArray& s
     QDataStream again(&file);
     const bool holdsAnother = readCacheFile(again, nullptr);
     clear();
-    const QByteArray name = path.toLocal8Bit();
+    const QByteArray name = pathBytes(path);
     return failMerge(holdsAnother ? QString::asprintf("Tag file %s contains wrong study, expected %s",
                                                       name.constData(), studyUID.constData())
                                   : QString::asprintf("Could not read tag file %s", name.constData()));
@@ -96,7 +106,10 @@ void TagFile::mergeFresh(const Indexes& fresh)
 {
     TagMap& study = *mStudies.first();
     TagMap& freshStudy = *fresh.studies.first();
-    const bool hasLabels = std::any_of(fresh.series.cbegin(), fresh.series.cend(), isLabelled);
+    const bool hasLabels = std::any_of(fresh.series.cbegin(), fresh.series.cend(), isLabelled) ||
+                           std::any_of(mSeries.cbegin(), mSeries.cend(), isLabelled);
+    holdInSeries(freshStudy);
+    holdInSeries(study);
     for (auto it = fresh.series.cbegin(); it != fresh.series.cend(); ++it)
         mergeSeries(it.value(), it.key(), freshStudy, study);
     deleteEmptyNodes();
@@ -116,9 +129,13 @@ void TagFile::mergeFresh(const Indexes& fresh)
 /// the file.
 void TagFile::mergeSeries(TagMap* series, const QByteArray& seriesUID, TagMap& freshStudy, TagMap& study)
 {
-    for (TagMap* image : series->children())
-        delete mImages.take(imageKey(*image));
     TagMap* old = mSeries.value(seriesUID, nullptr);
+    for (TagMap* image : series->children()) {
+        TagMap* former = mImages.take(imageKey(*image));
+        if (former != nullptr && former->parent() == old && series->volumes().isEmpty())
+            image->takeVolumePlaces(*former);
+        delete former;
+    }
     if (old != nullptr && series->volumes().isEmpty() &&
         (!old->volumes().isEmpty() || old->children().size() > series->children().size())) {
         copyImages(*series, *old);
@@ -128,23 +145,28 @@ void TagFile::mergeSeries(TagMap* series, const QByteArray& seriesUID, TagMap& f
         mImages.insert(imageKey(*image), image);
     if (old != nullptr) {
         copyImages(*old, *series);
+        keepVolumeFileMark(*old, *series);
         delete old;
     }
     mSeries.insert(seriesUID, series);
     series->copyFromParent();
+    series->deleteElement(kFromDatabase);
     series->detachItems();
     freshStudy.removeChildMap(series);
-    study.addChildMap(series, TagMap::SeriesLevel);
+    attachBelow(study, series, TagMap::SeriesLevel);
 }
 
-/// Volumes do not come along: what an image says of those of its old series would name others in the new one.
+/// What an image says of the volumes of its old series would name others in the new one. It only comes along into the
+/// places of the image that it replaces.
 void TagFile::copyImages(const TagMap& from, TagMap& to)
 {
-    for (const TagMap* image : from.children()) {
+    for (TagMap* image : from.children()) {
         TagMap* copy = image->clone();
         copy->deleteElement(kVolumeIndex);
+        dropOfTheNode(*copy);
+        copy->takeVolumePlaces(*image);
         mImages.insert(imageKey(*copy), copy);
-        to.addChildMap(copy, TagMap::ImageLevel);
+        attachBelow(to, copy, TagMap::ImageLevel);
     }
 }
 

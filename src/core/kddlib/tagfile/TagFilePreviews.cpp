@@ -7,6 +7,7 @@
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/Volume.h"
 #include "platform/base/LogFile.h"
+#include "platform/os/PathName.h"
 #include "platform/volume/KxVolumeInfo.h"
 
 #include <QCryptographicHash>
@@ -219,12 +220,12 @@ bool TagFile::addPreview(TagMap* image, const QByteArray& file)
         LogFile::warnf(kNotCreated, file.constData(), condition.text());
         return false;
     }
-    return addPreview(image, format.getDataset(), QFile::decodeName(file));
+    return addPreview(image, format.getDataset(), pathText(file));
 }
 
 bool TagFile::addPreview(const QByteArray& sopInstanceUID, const QString& path)
 {
-    return addPreview(findImage(sopInstanceUID), QFile::encodeName(path));
+    return addPreview(findImage(sopInstanceUID), pathBytes(path));
 }
 
 bool TagFile::addPreview(DcmDataset* dataset, const QString& path)

@@ -1,3 +1,4 @@
+#include "kddlib/tagfile/NodeAttributes.h"
 #include "kddlib/tagfile/QAJob.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
@@ -47,12 +48,6 @@ void forgetMarkersBelow(const TagMap& node, const DcmTagKey& key)
 }
 
 }  // namespace
-
-const QVector<DcmTagKey>& attributesOfTheNode()
-{
-    static const QVector<DcmTagKey> keys = {kFromDatabase, kHasVolumeFile, kAbstract};
-    return keys;
-}
 
 bool TagFile::applyQA(QAData& job, QString& message)
 {
@@ -142,7 +137,7 @@ void TagFile::forgetUnseen(TagMap& node)
 {
     const QList<DcmTagKey> keys = node.tagsForLevel().keys();
     for (const DcmTagKey& key : keys) {
-        if (attributesOfTheNode().contains(key) || isSeenBelow(node, key))
+        if (isOfTheNode(key) || isSeenBelow(node, key))
             continue;
         node.deleteElement(key);
         if (node.findElement(key) == nullptr)

@@ -5,6 +5,7 @@
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
+#include "platform/os/PathName.h"
 
 #include <dcmtk/dcmdata/dcdeftag.h>
 
@@ -18,16 +19,6 @@ namespace
 {
 
 const DcmTagKey kAuditTime(0x0071, 0x0022);
-
-/// Lets a node that was placed below others inherit what they say of themselves.
-void inheritOfTheNode(TagMap& node)
-{
-    for (const DcmTagKey& key : attributesOfTheNode()) {
-        const TagElement* own = node.tagsForLevel().value(key, nullptr);
-        if (own != nullptr && own->markedAsMissing())
-            node.deleteElement(key);
-    }
-}
 
 /// Whether the log tells already of the change at that time.
 bool isNoted(const AuditLog& log, const QString& time, const AuditChange& change)
@@ -196,15 +187,11 @@ bool TagFile::QAJob::place(const Edit& edit, TagFile& target, const QByteArray& 
         volumes->movedTo.insert(edit.key, newKey);
     mLeft.insert({&origin(), seriesUID});
     std::unique_ptr<TagMap> image(origin().takeImage(edit.key));
-    for (const DcmTagKey& key : attributesOfTheNode())
-        image->deleteElement(key);
     image->deleteElement(kVolumeIndex);
     TagMap* placed = target.addTagMap(image.release(), nullptr, true);
     if (placed == nullptr)
         return failAt(edit.key,
                       QStringLiteral("study %1 does not take it").arg(QString::fromLatin1(mJob.studyUID)));
-    inheritOfTheNode(*placed);
-    inheritOfTheNode(*placed->parent());
     return true;
 }
 

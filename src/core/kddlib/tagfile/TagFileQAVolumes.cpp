@@ -2,6 +2,7 @@
 #include "kddlib/tagfile/VolumeIndex.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
+#include "platform/os/PathName.h"
 
 #include <memory>
 
@@ -49,6 +50,8 @@ QASeriesMove TagFile::QAVolumes::takeOut(TagFile& source, TagMap& series)
         QASeriesMove::Stack stack = {*volume, {}};
         for (int i = 0; i < volume->numImages(); ++i)
             stack.images.append(imageKey(*volume->image(i)));
+        // Its slices are to stay as they are while images come and go.
+        stack.volume.mImages.set({});
         move.stacks.push_back(stack);
     }
     series.clearVolumes();
@@ -131,20 +134,12 @@ void TagFile::QAVolumes::attach(TagMap* series, const Volume& volume, const QVec
         mTouched.append(series);
 }
 
-/// Volumes are known by their place in the series, and what an image says must agree with that.
+/// Volumes that came together from several series would share their indexes.
 void TagFile::QAVolumes::renumber(TagMap& series)
 {
-    series.deleteElement(kVolumeIndex);
-    if (series.findElement(kVolumeIndex) != nullptr)
-        series.markAsMissing(kVolumeIndex);
-    for (TagMap* image : series.children())
-        image->deleteElement(kVolumeIndex);
-    for (int i = 0; i < series.volumes().size(); ++i) {
-        Volume& volume = *series.volumes().at(i);
-        volume.mVolumeIndex = i;
-        for (int j = 0; j < volume.numImages(); ++j)
-            addVolumeIndex(*volume.image(j), i);
-    }
+    for (int i = 0; i < series.volumes().size(); ++i)
+        series.volumes().at(i)->mVolumeIndex = i;
+    nameVolumes(series);
 }
 
 /// The preview of a volume that is divided shows the image in its middle; it goes on with that one.
@@ -163,7 +158,7 @@ void TagFile::QAVolumes::obtainPreview(TagMap& series, const QVector<TagMap*>& i
         return;
     const QByteArray key = imageKey(middle);
     TagFile& holder = mDestination.findImage(key) == &middle ? mDestination : *mMove.source;
-    holder.addPreview(key, QString::fromLocal8Bit(path));
+    holder.addPreview(key, pathText(path));
 }
 
 }  // namespace Kdd

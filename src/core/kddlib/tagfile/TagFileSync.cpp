@@ -1,3 +1,4 @@
+#include "kddlib/tagfile/QAAudit.h"
 #include "kddlib/tagfile/TagFile.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
@@ -7,7 +8,10 @@
 #include "platform/database/Kxg.h"
 #include "platform/database/StorageManager.h"
 
+#include <QHash>
 #include <QSet>
+
+#include <dcmtk/dcmdata/dcdeftag.h>
 
 #include <condition_variable>
 #include <mutex>
@@ -68,11 +72,6 @@ private:
     std::thread mThread;  // the last member: it starts when the others are there
 };
 
-QByteArray forwardSlashes(QByteArray path)
-{
-    return path.replace('\\', '/');
-}
-
 QVector<QByteArray> volumeNames(const TagMap& series)
 {
     QVector<QByteArray> names;
@@ -81,7 +80,63 @@ QVector<QByteArray> volumeNames(const TagMap& series)
     return names;
 }
 
+const std::vector<Kxg::ImageFile> kNoImages;
+
 }  // namespace
+
+/// What the database lists of a study, in terms of the tree that is held. Corrections are no part of the database: an
+/// image that they gave another UID, series or study is listed as what it was before.
+class TagFile::DatabaseView
+{
+public:
+    DatabaseView(const TagFile& file, const Kxg::DicomDirectoryEntry& study)
+    {
+        const QHash<QByteArray, const TagMap*> renamed = correctedImages(file);
+        for (const Kxg::DicomDirectoryEntry& entry : study.entries) {
+            mListed.insert(entry.seriesInstanceUID);
+            if (entry.seriesInfo == nullptr)
+                continue;
+            mAsked.insert(entry.seriesInstanceUID);
+            for (const Kxg::ImageFile& image : entry.seriesInfo->images) {
+                mKnown.insert(file.findImage(image));
+                mKnown.insert(renamed.value(image.sopInstanceUID, nullptr));
+            }
+        }
+    }
+
+    bool lists(const QByteArray& seriesUID) const { return mListed.contains(seriesUID); }
+    bool listsImagesOf(const QByteArray& seriesUID) const { return mAsked.contains(seriesUID); }
+    bool knows(const TagMap* image) const { return mKnown.contains(image); }
+
+private:
+    /// By the UIDs that they had before. Those of another study are not listed here at all.
+    QHash<QByteArray, const TagMap*> correctedImages(const TagFile& file)
+    {
+        QHash<QByteArray, const TagMap*> renamed;
+        for (const TagMap* image : file.imagesByUID()) {
+            AuditLog log;
+            QVector<AuditEntry> entries;
+            if (!log.read(*image) || log.text().isEmpty() || !log.decode(entries))
+                continue;
+            QString formerUID;
+            for (const AuditEntry& entry : qAsConst(entries)) {
+                for (const AuditChange& change : entry.changes) {
+                    if (change.key == DCM_StudyInstanceUID)
+                        mKnown.insert(image);
+                    if (change.key == DCM_SOPInstanceUID && formerUID.isEmpty())
+                        formerUID = change.oldText;
+                }
+            }
+            if (!formerUID.isEmpty())
+                renamed.insert(formerUID.toLatin1(), image);
+        }
+        return renamed;
+    }
+
+    QSet<QByteArray> mListed;
+    QSet<QByteArray> mAsked;
+    QSet<const TagMap*> mKnown;
+};
 
 bool TagFile::readAndSync(const char* studyUIDGiven, const char* /*user*/)
 {
@@ -113,8 +168,9 @@ bool TagFile::readAndSync(const char* studyUIDGiven, const char* /*user*/)
         LogFile::errorf("%s", qUtf8Printable(result.text()));
         return false;
     }
+    // A series of volume files alone is one whose images are gone, not one whose images were not asked for.
     for (Kxg::DicomDirectoryEntry& entry : study->entries)
-        entry.seriesInfo = series.value(entry.seriesInstanceUID);
+        entry.seriesInfo = series.value(entry.seriesInstanceUID, std::make_shared<Kxg::SeriesInfo>());
     syncWithDatabase(study);
     return true;
 }
@@ -123,61 +179,72 @@ bool TagFile::syncWithDatabase(const std::shared_ptr<Kxg::DicomDirectoryEntry>& 
 {
     if (study == nullptr)
         return false;
+    if (!isEmpty() && studyInstanceUID() != study->studyInstanceUID) {
+        LogFile::errorf("Study %s is not synchronised with what the database says of study %s",
+                        studyInstanceUID().constData(), study->studyInstanceUID.constData());
+        return false;
+    }
     if (study->entries.empty()) {
         copyDatabaseValuesIntoTagMap(*study);
         return false;
     }
+    const DatabaseView view(*this, *study);
     bool isChanged = false;
-    QSet<QByteArray> listed;
     for (const Kxg::DicomDirectoryEntry& entry : study->entries) {
-        listed.insert(entry.seriesInstanceUID);
         if (TagMap* series = findSeries(entry.seriesInstanceUID))
             isChanged = syncSeries(*series, entry) || isChanged;
         else
             LogFile::warnf("Series %s not found in tag map", entry.seriesInstanceUID.constData());
     }
-    const QList<QByteArray> held = mSeries.keys();
-    std::vector<const char*> gone;
-    for (const QByteArray& uid : held) {
-        if (!listed.contains(uid))
-            gone.push_back(uid.constData());
-    }
-    isChanged = removeSeries(static_cast<int>(gone.size()), gone.data()) > 0 || isChanged;
+    isChanged = removeUnlisted(view) || isChanged;
     const int series = mSeries.size();
     copyDatabaseValuesIntoTagMap(*study);
     return isChanged || mSeries.size() != series;
 }
 
-/// Whether a path, a volume's name or an image changed.
+/// Whether a path or a volume's name changed.
 bool TagFile::syncSeries(TagMap& series, const Kxg::DicomDirectoryEntry& entry)
 {
-    const bool imagesChanged = entry.seriesInfo != nullptr && syncImages(series, *entry.seriesInfo);
+    bool isChanged = false;
+    for (const Kxg::ImageFile& file : entry.seriesInfo != nullptr ? entry.seriesInfo->images : kNoImages) {
+        const TagMap* image = findImage(file);
+        isChanged = isChanged || (image != nullptr && filePathOf(*image) != forwardSlashes(file.path));
+    }
+    bool complete = true;
+    addDicomFilePaths(&series, entry.seriesInfo.get(), false, complete);
     const QVector<QByteArray> names = volumeNames(series);
     addVolumeFilePath(&series, entry, false);
     for (const Kxg::DicomDirectoryEntry& file : entry.entries)
         addVolumeFilePath(&series, file, false);
-    return imagesChanged || names != volumeNames(series);
+    return isChanged || names != volumeNames(series);
 }
 
-bool TagFile::syncImages(TagMap& series, const Kxg::SeriesInfo& info)
+/// Removes the images and series that the database does not list. The path that an image brought along from the building
+/// of the file says nothing of what the database knows.
+bool TagFile::removeUnlisted(const DatabaseView& view)
 {
     bool isChanged = false;
-    QSet<const TagMap*> known;
-    for (const Kxg::ImageFile& file : info.images) {
-        const TagMap* image = findImage(file);
-        known.insert(image);
-        isChanged = isChanged || (image != nullptr && filePathOf(*image) != forwardSlashes(file.path));
+    const NodeIndex held = mSeries;
+    for (auto it = held.cbegin(); it != held.cend(); ++it) {
+        TagMap* series = it.value();
+        const QList<TagMap*> images = series->children();
+        // Of a listed series whose images were not asked for nothing is known.
+        const bool isAsked = !view.lists(it.key()) || view.listsImagesOf(it.key());
+        for (int i = images.size() - 1; i >= 0 && isAsked; --i) {
+            if (view.knows(images.at(i)))
+                continue;
+            dropImage(images.at(i));
+            isChanged = true;
+        }
+        if (view.lists(it.key()) || !series->children().isEmpty())
+            continue;
+        TagMap* study = series->parent();
+        dropSeries(series);
+        isChanged = true;
+        if (study != nullptr)
+            dropStudyIfEmpty(study);
     }
-    // A path that an image brought along from the building of the file says nothing of what the database knows.
-    for (TagMap* image : series.children()) {
-        if (!known.contains(image))
-            image->deleteElement(kFilePath);
-    }
-    bool complete = true;
-    const int images = series.children().size();
-    if (addDicomFilePaths(&series, &info, false, complete) < images)
-        removeImagesWithoutFilename(&series);
-    return isChanged || series.children().size() != images;
+    return isChanged;
 }
 
 }  // namespace Kdd

@@ -1,4 +1,5 @@
 #include "kddlib/previews/QuadrantNavigation.h"
+#include "kddlib/tagfile/NodeAttributes.h"
 #include "kddlib/tagfile/TagFile.h"
 #include "kddlib/tagfile/VolumeIndex.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
@@ -7,6 +8,8 @@
 #include "kddlib/volumes/VolumeInfo.h"
 #include "platform/base/CreateUIDs.h"
 #include "platform/base/LogFile.h"
+
+#include <QSet>
 
 #include <dcmtk/dcmdata/dcdeftag.h>
 
@@ -41,23 +44,24 @@ TagMap* copyInto(const TagMap& series, const TagMap& image, int volumeIndex)
 
 void TagFile::addVolumeInfo(const std::vector<VolumeInfo*>& infos)
 {
-    TagMap* series = nullptr;
+    QSet<TagMap*> touched;
     int index = -1;
     for (const VolumeInfo* info : infos) {
         ++index;
         const QVector<TagMap*> images = imagesOf(*info, index);
         if (images.isEmpty())
             continue;
-        series = images.first()->parent();
+        TagMap* series = images.first()->parent();
         auto* volume = new Volume(index);
         volume->setInfo(*info, images);
         series->addBareVolume(volume);
+        touched.insert(series);
     }
-    if (series != nullptr)
+    for (TagMap* series : qAsConst(touched))
         series->optimize(kVolumeIndex);
 }
 
-/// The images of a volume, each told that it belongs to it.
+/// The images of a volume, all of one series, each told that it belongs to it.
 QVector<TagMap*> TagFile::imagesOf(const VolumeInfo& info, int volumeIndex) const
 {
     QVector<TagMap*> images;
@@ -67,6 +71,11 @@ QVector<TagMap*> TagFile::imagesOf(const VolumeInfo& info, int volumeIndex) cons
         if (image == nullptr || image->parent() == nullptr) {
             LogFile::tracef(2, kCategory, "3D volume %s contains unknown image %s", info.name.constData(),
                             uid.c_str());
+            continue;
+        }
+        if (!images.isEmpty() && image->parent() != images.first()->parent()) {
+            LogFile::warnf("3D volume %s contains image %s of another series, %s", info.name.constData(),
+                           uid.c_str(), image->uid(TagMap::SeriesLevel).constData());
             continue;
         }
         images.append(image);
@@ -86,17 +95,17 @@ Volume* Volume::duplicate(TagFile& tagFile, TagMap& series) const
 {
     auto* copy = new Volume;
     series.addBareVolume(copy);
-    copy->mSlices = mSlices;
+    copy->mSlices = slices();
     copy->setGeometry(mDims, mBoundingBox, mTransformation);
     copy->mRescaleSlope = mRescaleSlope;
     copy->mRescaleIntercept = mRescaleIntercept;
     copy->setPadding(mPaddingValue, mPaddingRangeLimit);
-    copy->mImages.reserve(mImages.size());
-    for (const TagMap* image : mImages) {
-        TagMap* placed = tagFile.addTagMap(copyInto(series, *image, copy->mVolumeIndex), nullptr, false);
-        if (placed != nullptr)
-            copy->mImages.append(placed);
-    }
+    QVector<TagMap*> placed;
+    placed.reserve(numImages());
+    for (const TagMap* image : images())
+        placed.append(tagFile.addTagMap(copyInto(series, *image, copy->mVolumeIndex), nullptr, false));
+    // Slices are those of the images at the same places, so one that was not placed is a gap.
+    copy->mImages.set(placed);
     series.optimizeAll();
     if (series.parent() != nullptr)
         series.parent()->optimizeAll();

@@ -162,6 +162,11 @@ bool TagFile::write(QDataStream& out, CompressionMode mode)
     const Stopwatch stopwatch;
     BodyWriter writer(*this);
     for (auto study = mStudies.cbegin(); study != mStudies.cend(); ++study) {
+        for (TagMap* series : study.value()->children()) {
+            const QString reason = settleVolumes(*series);
+            if (!reason.isEmpty())
+                return fail(reason);
+        }
         study.value()->relinkItems();
         if (!writer.write(study.key(), *study.value()))
             return fail(writer.refusal());

@@ -1,13 +1,9 @@
 #include "kddlib/Limits.h"
-#include "kddlib/tagmodel/OwnAttributes.h"
-#include "kddlib/tagmodel/TagElement.h"
+#include "kddlib/tagfile/VolumeIndex.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/Volume.h"
 #include "platform/base/KxMsg.h"
 
-#include <QMap>
-
-#include <algorithm>
 #include <cmath>
 #include <memory>
 #include <vector>
@@ -240,84 +236,12 @@ KxHistogram readHistogram(KxMsg& in)
     return {bins, double(minimum), double(maximum)};
 }
 
-using ImagesByVolume = QMap<int, QVector<TagMap*>>;
-
-/// The indexes in ascending order, each once. An image of several volumes has a byte for each of them.
-QVector<int> volumeIndexes(const TagElement& element)
-{
-    if (element.vr() != VrCode::OB) {
-        bool ok = false;
-        const int index = element.valueAsInt(&ok, 0);
-        return ok ? QVector<int>{index} : QVector<int>();
-    }
-    std::vector<bool> isNamed(kMaxByte + 1);
-    for (const char byte : element.value())
-        isNamed[static_cast<quint8>(byte)] = true;
-    QVector<int> indexes;
-    for (int i = 0; i <= kMaxByte; ++i) {
-        if (isNamed[static_cast<std::size_t>(i)])
-            indexes.append(i);
-    }
-    return indexes;
-}
-
-/// False when there are too many.
-bool findImages(const TagMap& series, ImagesByVolume& found)
-{
-    // Mostly the series holds the value for all its images. It may be long, so it is looked through once.
-    const TagElement* shared = series.findElement(kVolumeIndex);
-    const QVector<int> sharedIndexes = shared != nullptr ? volumeIndexes(*shared) : QVector<int>();
-    int left = kMaxVolumeImages;
-    for (TagMap* image : series.children()) {
-        const TagElement* element = image->findElement(kVolumeIndex);
-        if (element == nullptr)
-            continue;
-        const QVector<int> indexes = element == shared ? sharedIndexes : volumeIndexes(*element);
-        left -= indexes.size();
-        if (left < 0)
-            return false;
-        for (const int index : indexes)
-            found[index].append(image);
-    }
-    return true;
-}
-
-/// Whether `findImages` would find too many. Few images cannot name that many volumes, so they are not looked at.
+/// Whether the reader would find too many. Few images cannot name that many volumes, so they are not looked at.
 bool namesTooManyImages(const TagMap& series)
 {
-    ImagesByVolume unused;
+    QVector<VolumeShare> unused;
     return qint64(series.children().size()) * (kMaxByte + 1) > kMaxVolumeImages &&
-           !findImages(series, unused);
-}
-
-/// What the images of a series say about a volume.
-struct VolumeImages
-{
-    int index;
-    QVector<TagMap*> images;
-};
-
-/// For each volume the images that name it by its position. The indexes have gaps, though, when a volume file
-/// gave no volume: as many indexes as there are volumes with slices belong to these one after the other.
-QVector<VolumeImages> shareOut(const ImagesByVolume& images,
-                               const std::vector<std::unique_ptr<Volume>>& volumes)
-{
-    const auto hasSlices = [](const std::unique_ptr<Volume>& volume) { return volume->slices().size() > 0; };
-    const bool inOrder = std::count_if(volumes.begin(), volumes.end(), hasSlices) == images.size();
-    QVector<VolumeImages> shares;
-    auto named = images.cbegin();
-    for (const std::unique_ptr<Volume>& volume : volumes) {
-        const int position = shares.size();
-        if (!inOrder) {
-            shares.append(VolumeImages{position, images.value(position)});
-        } else if (hasSlices(volume)) {
-            shares.append(VolumeImages{named.key(), named.value()});
-            ++named;
-        } else {
-            shares.append(VolumeImages{position, {}});
-        }
-    }
-    return shares;
+           !shareImages(series, QVector<bool>(series.volumes().size(), true), unused);
 }
 
 std::vector<std::unique_ptr<Volume>> readVolumes(KxMsg& in, const QList<QByteArray>& blobs)
@@ -362,16 +286,18 @@ void TagMap::deserializeVolumes(KxMsg& in, const QList<QByteArray>& blobs)
     std::vector<std::unique_ptr<Volume>> volumes = readVolumes(in, blobs);
     if (volumes.empty() || in.failed())
         return;
-    ImagesByVolume images;
+    QVector<bool> haveSlices;
+    for (const std::unique_ptr<Volume>& volume : volumes)
+        haveSlices.append(volume->slices().size() > 0);
+    QVector<VolumeShare> shares;
     // Every list goes through all the images, so a series has one; a file of nothing but lists would take
     // forever.
-    if (!mVolumes.isEmpty() || !findImages(*this, images)) {
+    if (!mVolumes.isEmpty() || !shareImages(*this, haveSlices, shares)) {
         in.setFailed();
         return;
     }
-    const QVector<VolumeImages> shares = shareOut(images, volumes);
     for (std::unique_ptr<Volume>& volume : volumes) {
-        const VolumeImages& share = shares.at(mVolumes.size());
+        const VolumeShare& share = shares.at(mVolumes.size());
         volume->attachImages(share.index, share.images);
         mVolumes.append(volume.release());
     }
@@ -382,7 +308,7 @@ void Volume::serialize(KxMsg& out, QList<QByteArray>& blobs) const
     KxMsg record;
     record << mDims << mBoundingBox << mTransformation;
     writeText(record, mVolumeFileName);
-    writeSlices(record, mSlices, sliceCode(mSlices, mImages.size(), mDims));
+    writeSlices(record, slices(), sliceCode(slices(), numImages(), mDims));
     writePreview(record, mPreviewData, blobs);
     if (hasExtraData())
         serializeExtraData(record);

@@ -12,4 +12,9 @@ QByteArray filePathOf(const TagMap& image)
     return path;
 }
 
+QByteArray forwardSlashes(QByteArray path)
+{
+    return path.replace('\\', '/');
+}
+
 }  // namespace Kdd

@@ -31,4 +31,7 @@ constexpr const char* kOurPrivateCreator = "Korvex";
 /// Where the image's DICOM file lies; empty when that is not known.
 KDD_EXPORT QByteArray filePathOf(const TagMap& image);
 
+/// A path as it is kept in (0006,7100), whatever system it was written on.
+KDD_EXPORT QByteArray forwardSlashes(QByteArray path);
+
 }  // namespace Kdd

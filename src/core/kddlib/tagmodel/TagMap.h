@@ -6,6 +6,7 @@
 #include <QByteArray>
 #include <QList>
 #include <QMap>
+#include <QVector>
 
 #include <dcmtk/dcmdata/dctagkey.h>
 
@@ -28,6 +29,7 @@ class KxMsg;
 class TagElement;
 class TagSequence;
 class Volume;
+class VolumeImages;
 
 /// One node of a study's tree: the study, a series, an image, or an item of a sequence.
 ///
@@ -243,6 +245,11 @@ public:
 protected:
     friend class TagFile;
     friend class TagSequence;
+    friend class VolumeImages;
+
+    /// Hangs a child below this node as it is, and takes it over: it inherits all it does not hold, and neither node
+    /// gives or loses an attribute.
+    void appendChild(TagMap* child);
 
     void insertUID(Level level, TagElement* uid);
     TagElement* removeUID(Level level);
@@ -272,7 +279,10 @@ private:
     void relinkOwnItems();
     void hangBelow(TagMap* item);
     void forgetParent();
-    void forgetInVolumes(const TagMap* image);
+    void leaveVolumes();
+
+    /// Takes the places of another image in its volumes; that one is in none of them any more.
+    void takeVolumePlaces(TagMap& former);
     void forgetVolumeSuffixes();
     void releaseAll();
 
@@ -311,9 +321,17 @@ private:
     static std::unique_ptr<TagElement> readSequence(KxMsg& in, const DcmTagKey& key, const TagMap* parent,
                                                     RecordContext& context);
 
+    /// Where a volume's list of images names this node.
+    struct VolumePlace
+    {
+        VolumeImages* images;
+        int place;
+    };
+
     TagMap* mParent = nullptr;
     QList<TagMap*> mChildren;
     QList<Volume*> mVolumes;
+    QVector<VolumePlace> mVolumePlaces;
     Tags mTags;
     bool mIsSequenceItem = false;
     bool mIsInSequence = false;  // an item may also be the copy of one, which belongs to no sequence

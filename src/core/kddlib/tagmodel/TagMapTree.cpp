@@ -79,6 +79,7 @@ TagMap::~TagMap()
 void TagMap::releaseAll()
 {
     clearVolumes();
+    leaveVolumes();
     const QList<TagMap*> children = mChildren;
     for (TagMap* child : children) {
         if (mIsSequenceItem) {
@@ -107,7 +108,6 @@ bool TagMap::removeChildMap(TagMap* child)
 {
     if (mChildren.isEmpty())
         return false;
-    forgetInVolumes(child);
     if (mChildren.first() == child)
         mChildren.removeFirst();
     else if (mChildren.last() == child)
@@ -115,7 +115,15 @@ bool TagMap::removeChildMap(TagMap* child)
     else if (!mChildren.removeOne(child))
         return false;
     child->mIsTakenOut = true;
+    child->leaveVolumes();
     return true;
+}
+
+void TagMap::appendChild(TagMap* child)
+{
+    child->mParent = this;
+    child->mIsTakenOut = false;
+    mChildren.append(child);
 }
 
 TagElement* TagMap::removeUID(Level level)

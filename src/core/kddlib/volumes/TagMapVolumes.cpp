@@ -1,5 +1,6 @@
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/Volume.h"
+#include "kddlib/volumes/VolumeImages.h"
 
 namespace Kdd
 {
@@ -20,11 +21,20 @@ void TagMap::clearVolumes()
     mVolumes.clear();
 }
 
-/// Volumes point to the images of their series without owning them.
-void TagMap::forgetInVolumes(const TagMap* image)
+void TagMap::leaveVolumes()
 {
-    for (Volume* volume : qAsConst(mVolumes))
-        volume->forgetImage(image);
+    for (const VolumePlace& each : qAsConst(mVolumePlaces))
+        each.images->forget(each.place);
+    mVolumePlaces.clear();
+}
+
+void TagMap::takeVolumePlaces(TagMap& former)
+{
+    for (const VolumePlace& each : qAsConst(former.mVolumePlaces)) {
+        each.images->put(each.place, this);
+        mVolumePlaces.append(each);
+    }
+    former.mVolumePlaces.clear();
 }
 
 void TagMap::forgetVolumeSuffixes()

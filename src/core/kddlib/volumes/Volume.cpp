@@ -6,6 +6,7 @@
 
 #include <QCryptographicHash>
 #include <QHash>
+#include <QSet>
 
 #include <dcmtk/dcmdata/dcdeftag.h>
 
@@ -154,9 +155,43 @@ Slice SliceList::at(int i) const
     return mListed.at(i);
 }
 
+/// Closing the gaps takes time by the number of images, so those of many images that leave are closed together.
+const QVector<TagMap*>& Volume::images() const
+{
+    if (mImages.hasGaps())
+        closeGaps();
+    return mImages.list();
+}
+
+void Volume::closeGaps() const
+{
+    const QVector<int> places = mImages.closeGaps();
+    QVector<Slice> slices;
+    slices.reserve(mSlices.size());
+    for (int i = 0; i < mSlices.size(); ++i) {
+        const Slice slice = mSlices.at(i);
+        slices.append({places.value(slice.image, -1), slice.frame});
+    }
+    mSlices = SliceList(slices);
+}
+
+/// Its slices stay, with an unknown image.
+void Volume::forgetImage(int i)
+{
+    QVector<TagMap*> left = mImages.list();
+    left[i] = nullptr;
+    mImages.set(left);
+}
+
+const SliceList& Volume::slices() const
+{
+    images();
+    return mSlices;
+}
+
 TagMap* Volume::image(int i) const
 {
-    return mImages.value(i, nullptr);
+    return images().value(i, nullptr);
 }
 
 TagMap* Volume::imageForSlice(int slice, int& frame) const
@@ -165,7 +200,7 @@ TagMap* Volume::imageForSlice(int slice, int& frame) const
         frame = -1;
         return image(slice);
     }
-    const Slice entry = mSlices.at(slice);
+    const Slice entry = slices().at(slice);
     frame = entry.frame;
     return image(entry.image);
 }
@@ -173,9 +208,9 @@ TagMap* Volume::imageForSlice(int slice, int& frame) const
 std::vector<std::string> Volume::sopUIDList() const
 {
     std::vector<std::string> identifiers;
-    identifiers.reserve(static_cast<std::size_t>(mImages.size()));
+    identifiers.reserve(static_cast<std::size_t>(numImages()));
     for (int i = 0; i < mSlices.size(); ++i) {
-        const Slice slice = mSlices.at(i);
+        const Slice slice = slices().at(i);
         const TagMap* holder = image(slice.image);
         if (holder == nullptr)
             continue;
@@ -201,24 +236,6 @@ QByteArray Volume::volumeHash() const
 void Volume::volumeHash(std::string& out) const
 {
     out = volumeHash().toStdString();
-}
-
-void Volume::forgetImage(const TagMap* image)
-{
-    const auto at = std::find(mImages.begin(), mImages.end(), image);
-    if (at == mImages.end())
-        return;
-    const auto index = static_cast<qint32>(at - mImages.begin());
-    mImages.erase(at);
-    QVector<Slice> slices;
-    slices.reserve(mSlices.size());
-    for (int i = 0; i < mSlices.size(); ++i) {
-        Slice slice = mSlices.at(i);
-        if (slice.image >= index)
-            slice.image = slice.image == index ? -1 : slice.image - 1;
-        slices.append(slice);
-    }
-    setSlices(slices);
 }
 
 void Volume::setGeometry(const Vec3i& dims, const Box3f& box, const Mat4f& transformation)
@@ -252,7 +269,7 @@ float Volume::precisionBitLoss() const
 void Volume::initRescaleSlopeIntercept() const
 {
     RescaleSlopeCalculator calculator(kSixteenBitBuffer);
-    for (const TagMap* image : mImages)
+    for (const TagMap* image : images())
         addImage(calculator, *image);
     mRescaleSlope = calculator.rescaleSlope();
     mRescaleIntercept = calculator.rescaleIntercept();
@@ -284,18 +301,16 @@ QByteArray Volume::fileNameSuffix(const char* fileName)
 
 void Volume::setImages(const QVector<TagMap*>& images, TagMap* single)
 {
-    if (!images.isEmpty()) {
-        mImages = imagesOf(sorted(images));
-        return;
-    }
-    if (single != nullptr)
-        mImages.append(single);
+    if (!images.isEmpty())
+        mImages.set(imagesOf(sorted(images)));
+    else if (single != nullptr)
+        mImages.set(QVector<TagMap*>(this->images()) << single);
 }
 
 void Volume::setMultiFrameInfo(const std::vector<std::string>& frameIdentifiers)
 {
-    const QVector<SortedImage> order = sorted(mImages);
-    mImages = imagesOf(order);
+    const QVector<SortedImage> order = sorted(images());
+    mImages.set(imagesOf(order));
     QVector<Slice> slices;
     if (frameIdentifiers.empty()) {
         slices.resize(order.size());
@@ -316,7 +331,7 @@ void Volume::setMultiFrameInfo(const std::vector<std::string>& frameIdentifiers)
 
 void Volume::setInfo(const VolumeInfo& info, const QVector<TagMap*>& images)
 {
-    mImages = images;
+    mImages.set(images);
     setMultiFrameInfo(info.frameIdentifiers);
     setGeometry(info.dims, info.boundingBox, info.transformation);
     mPreviewData = info.preview;
@@ -332,10 +347,32 @@ void Volume::attachImages(int volumeIndex, const QVector<TagMap*>& images)
 {
     mVolumeIndex = volumeIndex;
     setImages(images, nullptr);
-    if (mImages.isEmpty() || !hasSignedPixels(*mImages.first()))
+    if (numImages() == 0 || !hasSignedPixels(*image(0)))
         return;
     extendSign(mPaddingValue);
     extendSign(mPaddingRangeLimit);
+}
+
+bool Volume::arrangeLike(const QVector<TagMap*>& images)
+{
+    const QVector<TagMap*> former = this->images();
+    const QVector<TagMap*> order = imagesOf(sorted(images));
+    if (order == former)
+        return true;
+    QHash<TagMap*, int> places;
+    for (int i = 0; i < order.size(); ++i)
+        places.insert(order.at(i), i);
+    if (QSet<TagMap*>(former.begin(), former.end()) != QSet<TagMap*>(order.begin(), order.end()))
+        return false;
+    QVector<Slice> slices;
+    slices.reserve(mSlices.size());
+    for (int i = 0; i < mSlices.size(); ++i) {
+        const Slice slice = mSlices.at(i);
+        slices.append({places.value(former.value(slice.image, nullptr), -1), slice.frame});
+    }
+    mImages.set(order);
+    setSlices(slices);
+    return true;
 }
 
 bool Volume::hasExtraData() const

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "kddlib/volumes/VolumeImages.h"
 #include "platform/base/Export.h"
 #include "platform/base/Geometry.h"
 #include "platform/volume/KxHistogram.h"
@@ -61,8 +62,8 @@ private:
 /// A stack of slices: images of one series, or the frames of multi-frame images, with what a viewer needs to
 /// load them without opening the DICOM files.
 ///
-/// Hangs below a series, which owns it. It points to images of the study's tree without owning them; an image
-/// must outlive the volume or be taken out of it by `forgetImage`.
+/// Hangs below a series, which owns it. It points to images of the study's tree without owning them. An image
+/// that goes away or leaves its series leaves the volume too; its slices stay, with an unknown image.
 ///
 /// A copy names the same images. Used by one thread at a time: the rescale values and the hash are computed
 /// by the first const query and kept.
@@ -81,19 +82,19 @@ public:
 
     // ---- images and slices
 
-    int numImages() const { return mImages.size(); }
+    int numImages() const { return images().size(); }
 
     /// Null when there is no such image. Owned by the study's tree.
     TagMap* image(int i) const;
 
-    const SliceList& slices() const { return mSlices; }
+    const SliceList& slices() const;
 
     /// The image that holds the slice, and the frame in it. Null when the slice's image is unknown. Without
     /// such a slice the image of that number, with -1 as frame: a volume without slices has one per image.
     TagMap* imageForSlice(int slice, int& frame) const;
 
     /// Whether there are more slices than images.
-    bool isMultiFrame() const { return mSlices.size() > mImages.size(); }
+    bool isMultiFrame() const { return mSlices.size() > numImages(); }
 
     /// The SOP Instance UID of each slice whose image is known, followed by "." and the frame number if the
     /// volume is multi-frame.
@@ -103,9 +104,6 @@ public:
     /// once: it stays when images change later.
     QByteArray volumeHash() const;
     void volumeHash(std::string& out) const;
-
-    /// Takes out an image that leaves the tree. Its slices stay, with an unknown image.
-    void forgetImage(const TagMap* image);
 
     /// A copy inside `series`, with a copy of every image under a new SOP Instance UID, which are added to the tag
     /// file; `series` must be one of its series. The slices, geometry, rescale slope and intercept and padding are
@@ -214,6 +212,10 @@ protected:
     /// Completes a volume that was read by its index and its images.
     void attachImages(int volumeIndex, const QVector<TagMap*>& images);
 
+    /// Puts the images into the order and number in which `attachImages` would have them, given these; every slice
+    /// keeps its image. False, with nothing changed, when these are not the volume's images.
+    bool arrangeLike(const QVector<TagMap*>& images);
+
     void initRescaleSlopeIntercept() const;
 
     /// Whether the tag file can hold suffix, rescale values, padding and histogram: there must be a suffix
@@ -221,9 +223,13 @@ protected:
     bool hasExtraData() const;
 
 private:
+    const QVector<TagMap*>& images() const;
+    void forgetImage(int i);
+    void closeGaps() const;
+
     qint32 mVolumeIndex = -1;
-    QVector<TagMap*> mImages;
-    SliceList mSlices;
+    mutable VolumeImages mImages;  // gaps are closed when the images are next asked for
+    mutable SliceList mSlices;
     Vec3i mDims;
     Box3f mBoundingBox;
     Mat4f mTransformation;

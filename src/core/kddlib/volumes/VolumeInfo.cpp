@@ -55,17 +55,49 @@ boost::optional<qint32> optionalInteger(const ParamBundle& parameters, const cha
     return parameters.integer(name, 0);
 }
 
+/// A tag file has no room for a bin for each of 65,536 values, and a volume with more bins than there is room for loses
+/// its suffix there: two values share a bin then.
+QVector<quint64> inPairs(const QVector<quint64>& counts)
+{
+    QVector<quint64> pairs;
+    pairs.reserve(counts.size() / 2);
+    for (int i = 0; i + 1 < counts.size(); i += 2)
+        pairs.append(counts.at(i) + counts.at(i + 1));
+    return pairs;
+}
+
+/// Without a range the bins can be understood when there is one for every value that the pixels can have; else there are
+/// none.
+KxHistogram ofEveryValue(const QVector<quint64>& counts, PrimitiveType type)
+{
+    const int values = sizeOf(type) <= 2 ? 1 << (8 * sizeOf(type)) : 0;
+    if (counts.size() != values)
+        return {};
+    const bool isSigned = type == PrimitiveType::Int8 || type == PrimitiveType::Int16;
+    const int least = isSigned ? -values / 2 : 0;
+    return {sizeOf(type) == 2 ? inPairs(counts) : counts, double(least), double(least + values - 1)};
+}
+
 KxHistogram histogramOf(const OrlanMesh& mesh, const QByteArray& path)
 {
     QVector<quint64> counts;
     if (!mesh.hasDataSection(kHistogram))
         return {};
     const Result result = mesh.readDataSection(kHistogram, counts);
-    if (result.bad())
-        LogFile::warnf("3D volume %s has no usable histogram: %s", path.constData(),
-                       qUtf8Printable(result.text()));
     const QVector<double> range = mesh.parameters().numbers("DataMinMax");
-    return result.bad() || range.size() != 2 ? KxHistogram() : KxHistogram(counts, range.at(0), range.at(1));
+    if (result.good() && range.size() == 2)
+        return {counts, range.at(0), range.at(1)};
+    const Lattice* lattice = mesh.findLattice(kLevel0, 3);
+    if (result.good() && range.isEmpty() && lattice != nullptr) {
+        KxHistogram histogram = ofEveryValue(counts, lattice->type);
+        if (histogram.numBins() > 0)
+            return histogram;
+    }
+    const QString reason = result.bad()
+                               ? result.text()
+                               : QStringLiteral("nothing tells the range of its %1 bins").arg(counts.size());
+    LogFile::warnf("3D volume %s has no usable histogram: %s", path.constData(), qUtf8Printable(reason));
+    return {};
 }
 
 std::string withoutFrame(const std::string& identifier)

@@ -1,4 +1,6 @@
-#include "kddlib/volumes/VolumeFileName.h"
+#include "platform/volumefile/VolumeFileName.h"
+
+#include <QtGlobal>
 
 namespace Kdd
 {
@@ -10,6 +12,11 @@ const char* const kPart = "_part";
 
 /// Beyond every number of volumes, and far from what an int cannot hold.
 constexpr int kTooMany = 100 * 1000 * 1000;
+
+int partNumberOfFile(const QByteArray& path)
+{
+    return partNumberOf(path.mid(qMax(path.lastIndexOf('/'), path.lastIndexOf('\\')) + 1));
+}
 
 }  // namespace
 
@@ -26,6 +33,13 @@ int partNumberOf(const QByteArray& name)
         number = number * 10 + (digit - '0');
     }
     return number;
+}
+
+bool isEarlierPart(const QByteArray& left, const QByteArray& right)
+{
+    const int leftPart = partNumberOfFile(left);
+    const int rightPart = partNumberOfFile(right);
+    return leftPart != rightPart ? leftPart < rightPart : left < right;
 }
 
 }  // namespace Kdd

@@ -1,0 +1,73 @@
+#include "kddlib/volumes/VolumeImages.h"
+
+#include "kddlib/tagmodel/TagMap.h"
+
+#include <algorithm>
+
+namespace Kdd
+{
+
+VolumeImages::VolumeImages(const VolumeImages& other)
+{
+    *this = other;
+}
+
+VolumeImages& VolumeImages::operator=(const VolumeImages& other)
+{
+    if (this == &other)
+        return *this;
+    set(other.mImages);
+    return *this;
+}
+
+VolumeImages::~VolumeImages()
+{
+    release();
+}
+
+void VolumeImages::set(const QVector<TagMap*>& images)
+{
+    const QVector<TagMap*> kept = images;  // which may be this list
+    release();
+    mImages = kept;
+    mHasGaps = kept.contains(nullptr);
+    for (int i = 0; i < mImages.size(); ++i) {
+        if (TagMap* image = kept.at(i))
+            image->mVolumePlaces.append({this, i});
+    }
+}
+
+QVector<int> VolumeImages::closeGaps()
+{
+    QVector<int> places(mImages.size(), -1);
+    QVector<TagMap*> kept;
+    kept.reserve(mImages.size());
+    for (int i = 0; i < places.size(); ++i) {
+        if (mImages.at(i) == nullptr)
+            continue;
+        places[i] = kept.size();
+        kept.append(mImages.at(i));
+    }
+    set(kept);
+    return places;
+}
+
+void VolumeImages::forget(int place)
+{
+    mImages[place] = nullptr;
+    mHasGaps = true;
+}
+
+void VolumeImages::release()
+{
+    for (TagMap* image : qAsConst(mImages)) {
+        if (image == nullptr)
+            continue;
+        QVector<TagMap::VolumePlace>& places = image->mVolumePlaces;
+        places.erase(std::remove_if(places.begin(), places.end(),
+                                    [this](const TagMap::VolumePlace& each) { return each.images == this; }),
+                     places.end());
+    }
+}
+
+}  // namespace Kdd

@@ -1,0 +1,269 @@
+#include "TagFileFixture.h"
+#include "kddlib/tagfile/QAData.h"
+#include "kddlib/volumes/Volume.h"
+#include "kddlib/volumes/VolumeInfo.h"
+#include "platform/database/DirectoryEntry.h"
+
+#include <random>
+
+namespace Kdd
+{
+namespace
+{
+
+constexpr int kImages = 14;
+constexpr int kSteps = 30;
+constexpr unsigned kSeeds = 80;
+
+/// All that happens to images of volumes, at random, beside a model that knows for each slice of each volume its image.
+class VolumeOperations : public TagFileTest
+{
+protected:
+    struct Stack
+    {
+        QByteArray series;
+        std::vector<std::pair<QByteArray, int>> slices;  // image, empty when it is lost, and frame
+    };
+
+    int any(int count) { return static_cast<int>(mRandom() % static_cast<unsigned>(count)); }
+    QByteArray anyUID() { return QByteArray::number(1 + any(kImages)); }
+    QByteArray anySeries() { return "1.2." + QByteArray::number(any(3)); }
+
+    TagMap* newImage(const QByteArray& uid, const QByteArray& series)
+    {
+        return anImage(uid.constData())
+            .inSeries(series.constData())
+            .with(DCM_InstanceNumber, QByteArray::number(any(9)).constData())
+            .map();
+    }
+
+    /// Also one without UID, which is known by its path.
+    void build(unsigned seed)
+    {
+        mRandom.seed(seed);
+        mFile.clear();
+        mSeries.clear();
+        mStacks.clear();
+        for (int i = 1; i <= kImages; ++i)
+            place(mFile, QByteArray::number(i), anySeries());
+        mFile.addTagMap(anImage().inSeries("1.2.0").without(DCM_SOPInstanceUID).map(), "/a\\b", false);
+        std::vector<VolumeInfo> infos(static_cast<std::size_t>(any(6)));
+        std::vector<VolumeInfo*> pointers;
+        for (VolumeInfo& info : infos) {
+            describe(info, static_cast<int>(pointers.size()));
+            pointers.push_back(&info);
+            expect(info);
+        }
+        mFile.addVolumeInfo(pointers);
+    }
+
+    void place(TagFile& file, const QByteArray& uid, const QByteArray& series)
+    {
+        ASSERT_NE(file.addTagMap(newImage(uid, series), nullptr, true), nullptr);
+        if (mSeries.count(uid) != 0 && mSeries[uid] != series)
+            lose(uid);
+        mSeries[uid] = series;
+    }
+
+    /// Images of other series, strangers, images twice and frames included.
+    void describe(VolumeInfo& info, int number)
+    {
+        info.name = "x-stack_part" + QByteArray::number(number) + "1.vol";
+        info.histogram = KxHistogram({1}, 0, 1);
+        const bool hasFrames = any(3) == 0;
+        std::set<std::string> uids;
+        for (int i = 1 + any(8); i > 0; --i) {
+            const std::string uid = any(12) == 0 ? "stranger" : anyUID().toStdString();
+            if (hasFrames)
+                info.frameIdentifiers.push_back(uid + '.' + std::to_string(any(4)));
+            if (!hasFrames || uids.insert(uid).second)
+                info.imageUIDs.push_back(uid);
+        }
+        info.dims = {8, 8, static_cast<int>(info.imageUIDs.size())};
+    }
+
+    void expect(const VolumeInfo& info)
+    {
+        Stack stack;
+        for (const std::string& each : info.imageUIDs) {
+            const QByteArray uid = QByteArray::fromStdString(each);
+            if (stack.series.isEmpty() && mSeries.count(uid) != 0)
+                stack.series = mSeries[uid];
+            if (info.frameIdentifiers.empty() && mSeries.count(uid) != 0 && mSeries[uid] == stack.series)
+                stack.slices.emplace_back(uid, 0);
+        }
+        for (const std::string& each : info.frameIdentifiers) {
+            const QByteArray uid = QByteArray::fromStdString(each.substr(0, each.rfind('.')));
+            const bool isHeld = mSeries.count(uid) != 0 && mSeries[uid] == stack.series;
+            stack.slices.emplace_back(isHeld ? uid : QByteArray(),
+                                      std::stoi(each.substr(each.rfind('.') + 1)));
+        }
+        if (!stack.series.isEmpty())
+            mStacks[Volume::fileNameSuffix(info.name.constData())] = stack;
+    }
+
+    void lose(const QByteArray& uid)
+    {
+        for (auto& each : mStacks) {
+            for (auto& slice : each.second.slices) {
+                if (slice.first == uid)
+                    slice.first.clear();
+            }
+        }
+    }
+
+    void remove(const QByteArray& uid)
+    {
+        lose(uid);
+        mSeries.erase(uid);
+    }
+
+    void step()
+    {
+        const QByteArray uid = anyUID();
+        const bool isHeld = mSeries.count(uid) != 0;
+        const char* uids[] = {uid.constData()};
+        switch (any(8)) {
+        case 0:
+            EXPECT_EQ(mFile.removeImages(1, uids), isHeld ? 1 : 0);
+            return remove(uid);
+        case 1:
+            EXPECT_EQ(std::unique_ptr<TagMap>(mFile.takeImage(uid)) != nullptr, isHeld);
+            return remove(uid);
+        case 2:
+            return place(mFile, uid, isHeld && any(2) == 0 ? mSeries[uid] : anySeries());
+        case 3:
+            return mFile.optimizeAll();
+        case 4:
+            return sync();
+        case 5:
+            return merge();
+        case 6:
+            return correct();
+        default:
+            return;
+        }
+    }
+
+    /// The database lists all but a few images.
+    void sync()
+    {
+        const auto study = std::make_shared<Kxg::DicomDirectoryEntry>();
+        study->studyInstanceUID = "1.2";
+        std::map<QByteArray, std::shared_ptr<Kxg::SeriesInfo>> infos;
+        for (const auto& each : std::map<QByteArray, QByteArray>(mSeries)) {
+            auto& info = infos[each.second];
+            if (info == nullptr)
+                info = std::make_shared<Kxg::SeriesInfo>();
+            if (any(10) == 0)
+                remove(each.first);
+            else
+                info->images.push_back({each.first, "/store/" + each.first});
+        }
+        for (const auto& each : infos) {
+            study->entries.emplace_back();
+            study->entries.back().seriesInstanceUID = each.first;
+            study->entries.back().seriesInfo = each.second;
+        }
+        if (!mFile.isEmpty() && !infos.empty())
+            mFile.syncWithDatabase(study);
+    }
+
+    void merge()
+    {
+        mFile.deleteEmptyNodes();
+        if (mFile.isEmpty() || !mFile.writeCacheFile())
+            return;
+        TagFile arrivals;
+        for (int i = 1 + any(4); i > 0; --i) {
+            const QByteArray uid = anyUID();
+            place(arrivals, uid, mSeries.count(uid) != 0 && any(2) == 0 ? mSeries[uid] : anySeries());
+        }
+        ASSERT_TRUE(arrivals.mergeIntoCacheFile());
+        ASSERT_TRUE(mFile.readCacheFileForStudy("1.2", false));
+    }
+
+    /// Another place in the order of images.
+    void correct()
+    {
+        if (mFile.isEmpty() || !mFile.writeCacheFile())
+            return;
+        QAData job;
+        job.studyUID = "1.2";
+        job.images = {anyUID(), anyUID()};
+        job.substitutions.append({DCM_InstanceNumber, QString::number(any(9))});
+        QString message;
+        ASSERT_TRUE(TagFile::applyQA(job, message)) << qPrintable(message);
+        ASSERT_TRUE(mFile.readCacheFileForStudy("1.2", false));
+    }
+
+    static QByteArray lineOf(const QByteArray& series, const QByteArray& suffix)
+    {
+        return series + ' ' + suffix + ':';
+    }
+
+    std::string expected() const
+    {
+        QByteArray text;
+        for (const auto& [suffix, stack] : mStacks) {
+            QByteArray line;
+            bool isSeen = false;
+            for (const auto& [uid, frame] : stack.slices) {
+                line += ' ' + uid + '/' + QByteArray::number(frame);
+                isSeen = isSeen || !uid.isEmpty();
+            }
+            if (isSeen)
+                text += lineOf(stack.series, suffix) + line + '\n';
+        }
+        return text.toStdString();
+    }
+
+    static std::string found(const TagFile& file)
+    {
+        std::map<QByteArray, QByteArray> lines;
+        int nodes = 0;
+        for (auto it = file.seriesByUID().cbegin(); it != file.seriesByUID().cend(); ++it) {
+            nodes += it.value()->children().size();
+            for (const Volume* volume : it.value()->volumes()) {
+                QByteArray line = lineOf(it.key(), volume->fileNameSuffix());
+                for (int i = 0; i < volume->slices().size() && volume->numImages() > 0; ++i) {
+                    int frame = 0;
+                    const TagMap* image = volume->imageForSlice(i, frame);
+                    line += ' ' + (image != nullptr ? image->uid(TagMap::ImageLevel) : QByteArray()) + '/' +
+                            QByteArray::number(frame);
+                }
+                if (volume->numImages() > 0)
+                    lines[volume->fileNameSuffix()] = line + '\n';
+            }
+        }
+        EXPECT_EQ(nodes, file.imagesByUID().size());
+        QByteArray text;
+        for (const auto& each : lines)
+            text += each.second;
+        return text.toStdString();
+    }
+
+    std::mt19937 mRandom;
+    TagFile mFile;
+    std::map<QByteArray, QByteArray> mSeries;  // by image
+    std::map<QByteArray, Stack> mStacks;       // by suffix
+};
+
+TEST_F(VolumeOperations, KeepTheImageOfEverySliceThatIsThere)
+{
+    const LogCapture log;
+    for (unsigned seed = 0; seed < kSeeds && !HasFailure(); ++seed) {
+        build(seed);
+        for (int i = 0; i < kSteps && !HasFailure(); ++i) {
+            step();
+            EXPECT_EQ(found(mFile), expected()) << "seed " << seed << " step " << i;
+            TagFile again;
+            const bool isHeld = mFile.isEmpty() || read(again, written(mFile));
+            EXPECT_TRUE(isHeld);
+            EXPECT_EQ(found(again), mFile.isEmpty() ? "" : expected()) << "seed " << seed << " step " << i;
+        }
+    }
+}
+
+}  // namespace
+}  // namespace Kdd
