@@ -77,12 +77,15 @@ public:
     Kdd::Result finish(const BuiltStudy& built) override
     {
         return conclude([&] {
-            mConnection.change("UPDATE study SET tag_file_size = ?, tag_file_digest = ? WHERE id = ?",
-                               {built.tagFile.size, bytesValue(built.tagFile.digest), mStudyId});
-            describe(built.series);
+            keep(built);
             if (built.settleAt > 0)
                 leaveRequest(mConnection, mStudyId, built.settleAt);
         });
+    }
+
+    Kdd::Result finishChange(const BuiltStudy& built, qint64 request) override
+    {
+        return conclude({request}, [&] { keep(built); });
     }
 
     Kdd::Result finishRemoved() override
@@ -99,15 +102,24 @@ public:
     }
 
 private:
-    Kdd::Result conclude(const std::function<void()>& work)
+    Kdd::Result conclude(const std::function<void()>& work) { return conclude(mStudy.requests, work); }
+
+    Kdd::Result conclude(const QVector<qint64>& done, const std::function<void()>& work)
     {
         return attempt(mConnection.address(), [&] {
             mLock->confirm();
             mConnection.transact(SqlConnection::Access::Write, [&] {
-                deleteRequests(mConnection, mStudy.requests);
+                deleteRequests(mConnection, done);
                 work();
             });
         });
+    }
+
+    void keep(const BuiltStudy& built)
+    {
+        mConnection.change("UPDATE study SET tag_file_size = ?, tag_file_digest = ? WHERE id = ?",
+                           {built.tagFile.size, bytesValue(built.tagFile.digest), mStudyId});
+        describe(built.series);
     }
 
     void describe(const std::vector<DicomFileRecord>& series)
