@@ -3,17 +3,12 @@
 #include "kddlib/tagfile/TagFile.h"
 #include "platform/base/LogFile.h"
 #include "tools/kdd/Commands.h"
-#include "tools/kdd/Database.h"
 #include "tools/kdd/Report.h"
 #include "tools/kdd/Store.h"
-#include "tools/kdd/StudyBuild.h"
 
 #include <QFile>
 
-#include <algorithm>
 #include <cstdio>
-#include <memory>
-#include <vector>
 
 namespace Kdd
 {
@@ -25,8 +20,6 @@ constexpr qint64 kMaxImageList = 64 * 1024 * 1024;
 
 /// Each waits 0.4 seconds, so it goes on for two minutes.
 constexpr int kAttempts = 300;
-
-using Claims = std::vector<std::unique_ptr<Kxg::StudyClaim>>;
 
 bool readFile(const QString& name, qint64 limit, QByteArray& content)
 {
@@ -87,27 +80,6 @@ bool resolveStudies(const CorrectionRequest& request, QAData& job)
     return false;
 }
 
-/// Keeps away whoever changes tag files by way of the database. In the order of the UIDs, so that two moves in opposite
-/// directions do not wait for each other.
-bool claimStudies(Kxg::Catalogue& database, const QAData& job, Claims& claims)
-{
-    QList<QByteArray> uids = {job.studyUID};
-    if (!job.oldStudyUID.isEmpty() && job.oldStudyUID != job.studyUID)
-        uids.append(job.oldStudyUID);
-    std::sort(uids.begin(), uids.end());
-    for (const QByteArray& uid : qAsConst(uids)) {
-        QVector<QByteArray> registered;
-        if (!succeeded(database.findStudies(uid, 1, registered)))
-            return false;
-        if (!registered.contains(uid))
-            continue;
-        claims.push_back(claimStudy(database, uid));
-        if (claims.back() == nullptr)
-            return false;
-    }
-    return true;
-}
-
 bool apply(QAData& job)
 {
     QString message;
@@ -148,9 +120,7 @@ Outcome runCorrection(const GlobalOptions& options, const CorrectionRequest& req
     QAData job;
     if (!readJob(request, job) || !readImages(request, job) || !resolveStudies(request, job))
         return Outcome::Failed;
-    const std::unique_ptr<Kxg::Catalogue> database = openDatabase();
-    Claims claims;
-    if (database == nullptr || !claimStudies(*database, job, claims) || !apply(job))
+    if (!apply(job))
         return Outcome::Failed;
     report(options, job);
     return job.outcome.notFound.isEmpty() ? Outcome::Done : Outcome::Failed;

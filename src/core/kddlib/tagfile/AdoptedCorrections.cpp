@@ -49,13 +49,21 @@ Result AdoptedCorrections::finish()
 void AdoptedCorrections::look(const TagMap& image)
 {
     AuditLog log;
-    if (!log.read(image))
+    QVector<AuditEntry> entries;
+    if (!log.read(image) || !log.decode(entries))
         return leaveUndecided(image, "its audit log is damaged");
-    if (log.text().isEmpty())
+    if (entries.isEmpty())
         return;
     const QByteArray key = TagFile::imageKey(image);
-    const Kxg::ImageCorrection* known = mKnown.findShown(key, log);
     ImageIdentity identity = {mKnown.studyUID(), key};
+    std::vector<Kxg::ImageCorrection> elsewhere;
+    const Kxg::ImageCorrection* known = mKnown.findShown(key, log);
+    if (known == nullptr && !identify(image, log, identity))
+        return;
+    if (known == nullptr)
+        known = find(identity, elsewhere);
+    if (mResult.bad() || (known == nullptr && !isToBeKept(image, log, identity)))
+        return;
     ImageOverlay overlay;
     if (known != nullptr) {
         const AuditLog recorded = logOf(*known);
@@ -70,35 +78,53 @@ void AdoptedCorrections::look(const TagMap& image)
         }
         identity = {known->studyInstanceUID, known->image};
         overlay.decode(known->changes);
-    } else if (mKnown.find(identity) != nullptr || !identify(image, log, identity)) {
-        return;
     }
-    QVector<AuditEntry> entries;
-    if (!log.decode(entries))
-        return leaveUndecided(image, "its audit log is damaged");
     overlay.noteLogged(image);
     mFound.push_back({identity.studyUID, identity.image, mKnown.studyUID(), image.uid(TagMap::SeriesLevel),
                       key, overlay.encode()});
 }
 
-/// Which image a corrected one was that the database knows no correction of. False when the log came with the file, or
-/// when the image was removed from the database since.
+/// Which image a corrected one was. False when its log came with the file.
 bool AdoptedCorrections::identify(const TagMap& image, const AuditLog& log, ImageIdentity& identity)
 {
     const QByteArray path = filePathOf(image);
-    const ImageIdentity before = identityBefore(log, identity, path);
     DcmFileFormat file;
-    identity = before;
-    if (loadDicomFile(path.constData(), file).good()) {
-        const std::unique_ptr<TagMap> loaded(TagMap::createTagMap(file.getDataset(), kDefaultValueBound));
-        AuditLog own;
-        if (own.read(*loaded) && isSameOrContinued(log, own))
-            return false;
-        identity = identityOf(*loaded, path);
-    }
+    identity = identityBefore(log, identity, path);
+    if (loadDicomFile(path.constData(), file).bad())
+        return true;
+    const std::unique_ptr<TagMap> loaded(TagMap::createTagMap(file.getDataset(), kDefaultValueBound));
+    AuditLog own;
+    if (own.read(*loaded) && isSameOrContinued(log, own))
+        return false;
+    identity = identityOf(*loaded, path);
+    return true;
+}
+
+/// Null when the image was never corrected as far as the database knows. `elsewhere` holds what is found of an image
+/// that came from another study.
+const Kxg::ImageCorrection* AdoptedCorrections::find(const ImageIdentity& identity,
+                                                     std::vector<Kxg::ImageCorrection>& elsewhere)
+{
+    if (identity.studyUID == mKnown.studyUID())
+        return mKnown.find(identity);
+    mResult = openCatalogue();
+    if (mResult.good())
+        mResult = mCatalogue->corrections(identity.studyUID, elsewhere);
+    const auto found =
+        std::find_if(elsewhere.begin(), elsewhere.end(), [&](const Kxg::ImageCorrection& each) {
+            return ImageIdentity{each.studyInstanceUID, each.image} == identity;
+        });
+    return found != elsewhere.end() ? &*found : nullptr;
+}
+
+/// False for an image that was removed from the database since it was corrected.
+bool AdoptedCorrections::isToBeKept(const TagMap& image, const AuditLog& log, const ImageIdentity& identity)
+{
+    const QByteArray path = filePathOf(image);
     if (identity.studyUID == mKnown.studyUID())
         return mListed.contains(path) || isListed(identity, path);
-    // A file that was replaced by one of another study is no image of this study that was moved.
+    // A file that was replaced by one of another study is no image that was moved here.
+    const ImageIdentity before = identityBefore(log, {mKnown.studyUID(), TagFile::imageKey(image)}, path);
     if (before.studyUID != identity.studyUID)
         return false;
     if (isListed(identity, path))

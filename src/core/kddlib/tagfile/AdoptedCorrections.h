@@ -38,7 +38,10 @@ public:
 
 private:
     void look(const TagMap& image);
-    bool identify(const TagMap& image, const AuditLog& log, ImageIdentity& identity);
+    static bool identify(const TagMap& image, const AuditLog& log, ImageIdentity& identity);
+    const Kxg::ImageCorrection* find(const ImageIdentity& identity,
+                                     std::vector<Kxg::ImageCorrection>& elsewhere);
+    bool isToBeKept(const TagMap& image, const AuditLog& log, const ImageIdentity& identity);
     bool isListed(const ImageIdentity& identity, const QByteArray& path);
     void leaveUndecided(const TagMap& image, const char* reason);
     Result openCatalogue();

@@ -1,6 +1,5 @@
 #include "kddlib/tagfile/ImageIdentity.h"
 
-#include "kddlib/tagfile/QAAudit.h"
 #include "kddlib/tagmodel/TagMap.h"
 
 #include <dcmtk/dcmdata/dcdeftag.h>
@@ -43,6 +42,14 @@ ImageIdentity identityBefore(const AuditLog& log, const ImageIdentity& now, cons
 bool isSameOrContinued(const AuditLog& earlier, const AuditLog& later)
 {
     return later.text().startsWith(earlier.text());
+}
+
+bool isContinued(const AuditLog& before, const QVector<AuditChange>& changes, const AuditLog& log)
+{
+    QVector<AuditEntry> earlier;
+    QVector<AuditEntry> entries;
+    return log.text().startsWith(before.text()) && before.decode(earlier) && log.decode(entries) &&
+           entries.size() > earlier.size() && entries.at(earlier.size()).changes == changes;
 }
 
 }  // namespace Kdd

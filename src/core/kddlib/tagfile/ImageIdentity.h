@@ -1,11 +1,12 @@
 #pragma once
 
+#include "kddlib/tagfile/QAAudit.h"
+
 #include <QByteArray>
 
 namespace Kdd
 {
 
-class AuditLog;
 class TagMap;
 
 /// By what one image is told from all others.
@@ -30,5 +31,8 @@ ImageIdentity identityBefore(const AuditLog& log, const ImageIdentity& now, cons
 
 /// Whether a log tells all that the other one tells, and then more or nothing.
 bool isSameOrContinued(const AuditLog& earlier, const AuditLog& later);
+
+/// Whether `log` goes on where `before` ends, and with these changes: then its image is the one that they corrected.
+bool isContinued(const AuditLog& before, const QVector<AuditChange>& changes, const AuditLog& log);
 
 }  // namespace Kdd
