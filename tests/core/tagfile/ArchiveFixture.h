@@ -29,8 +29,11 @@ protected:
     using Uids = QList<QByteArray>;
     using Substitutions = QVector<QASubstitution>;
 
-    ArchiveTest()
+    /// With an embedded database unless there is one already.
+    explicit ArchiveTest(const QByteArray& address = QByteArray())
     {
+        if (!address.isEmpty())
+            mAddress = address;
         Kxg::SetDatabaseServer(mAddress);
         Result result;
         mCatalogue = Kxg::Catalogue::open(mAddress, result);

@@ -4,10 +4,12 @@
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "support/LogCapture.h"
+#include "support/PostgresServer.h"
 
 #include <sys/resource.h>
 
 #include <csignal>
+#include <thread>
 
 namespace Kdd
 {
@@ -262,6 +264,51 @@ TEST_F(RebuiltCorrections, AnImageWithoutUidIsKnownByItsPath)
     correct(edit({path("nameless")}, {{DCM_SOPInstanceUID, QStringLiteral("named")}}, "2"));
     expectSurvival(mAll);
     EXPECT_EQ(value("2", "named", DCM_PatientName), "Roe^R");
+}
+
+TEST_F(RebuiltCorrections, MovesInOppositeDirectionsAtOnceLoseNothing)
+{
+    const LogCapture quiet;
+    const auto moveAll = [](const char* from, const char* to) {
+        for (const char* uid : {"a", "b", "c", "z"}) {
+            QAData job = move({uid}, from, to);
+            QString message;
+            while (!TagFile::applyQA(job, message) && job.outcome.isLockedOut) {
+            }
+            EXPECT_EQ(message, QString());
+        }
+    };
+    std::thread there(moveAll, "1", "2");
+    std::thread back(moveAll, "2", "1");
+    there.join();
+    back.join();
+    EXPECT_EQ(imagesIn("1").size() + imagesIn("2").size(), 4);
+    expectSurvival(mAll);
+}
+
+/// The same on a server.
+class RebuiltCorrectionsOnServer : public ArchiveTest
+{
+protected:
+    RebuiltCorrectionsOnServer()
+        : ArchiveTest(newPostgresDatabase())
+    {
+    }
+};
+
+TEST_F(RebuiltCorrectionsOnServer, StayWithTheirLogs)
+{
+    for (const char* uid : {"a", "b"})
+        save(uid, "1");
+    buildAll();
+    correct(edit({"a"}, {{DCM_PatientName, QStringLiteral("Roe^R")}}));
+    correct(move({"a"}, "1", "2", {{DCM_SOPInstanceUID, QStringLiteral("a2")}}));
+    EXPECT_EQ(waiting(), 0);
+    expectSurvival({"1", "2"});
+    EXPECT_EQ(value("2", "a2", DCM_PatientName), "Roe^R");
+    correct(move({"a2"}, "2", "1", {{DCM_SOPInstanceUID, QStringLiteral("a")}}));
+    expectSurvival({"1", "2"});
+    EXPECT_EQ(imagesIn("1"), (Uids{"a", "b"}));
 }
 
 // ---- overlays

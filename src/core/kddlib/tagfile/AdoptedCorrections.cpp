@@ -11,15 +11,16 @@
 #include <dcmtk/dcmdata/dcfilefo.h>
 
 #include <algorithm>
+#include <utility>
 
 namespace Kdd
 {
 
 AdoptedCorrections::AdoptedCorrections(const TagFile& former, const BuildCorrections& known,
-                                       const QSet<QByteArray>& listed)
+                                       QSet<QByteArray> listed)
     : mFormer(former)
     , mKnown(known)
-    , mListed(listed)
+    , mListed(std::move(listed))
 {
 }
 

@@ -18,9 +18,9 @@ class TagFile;
 class AdoptedCorrections
 {
 public:
-    /// What is there so far: the study's tag file, the corrections known, and the DICOM files listed for the study. They
-    /// must outlive the object.
-    AdoptedCorrections(const TagFile& former, const BuildCorrections& known, const QSet<QByteArray>& listed);
+    /// What is there so far: the study's tag file and the corrections known, which must outlive the object, and the DICOM
+    /// files listed for the study.
+    AdoptedCorrections(const TagFile& former, const BuildCorrections& known, QSet<QByteArray> listed);
     ~AdoptedCorrections();
 
     /// Looks through the tag file and has what it finds recorded. On failure nothing is.
@@ -48,7 +48,7 @@ private:
 
     const TagFile& mFormer;
     const BuildCorrections& mKnown;
-    const QSet<QByteArray>& mListed;
+    const QSet<QByteArray> mListed;
     std::unique_ptr<Kxg::Catalogue> mCatalogue;
     std::vector<Kxg::ImageCorrection> mFound;
     QSet<QByteArray> mUndecided;

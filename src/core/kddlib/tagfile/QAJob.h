@@ -100,7 +100,8 @@ private:
     QAData& mJob;
     QString& mMessage;
     bool mIsMove = false;
-    bool mIsLabelled = false;  // the series were, in one of the studies
+    bool mSourceHasLabels = false;
+    bool mDestinationHasLabels = false;  // or a new one is to have them
     bool mReordersImages = false;  // in volumes
     QString mTime;
     QByteArray mBefore;  // the destination's file, of a move

@@ -81,23 +81,30 @@ QARecord::Answer QARecord::claim(const QAData& job, QString& reason)
         return Answer::Done;
     mCatalogue = std::move(catalogue);
     for (const QByteArray& uid : qAsConst(uids)) {
-        const bool isToBeMade = uid == job.studyUID && !known.contains(uid);
-        if (!isToBeMade && !known.contains(uid))
+        const bool isDestination = uid == job.studyUID;
+        if (!isDestination && !known.contains(uid))
             continue;
-        const Answer answer = claimOne(uid, isToBeMade, reason);
+        const Answer answer = claimOne(uid, isDestination, reason);
         if (answer != Answer::Done)
             return answer;
+        const auto claimed = mStudies.find(uid);
+        if (claimed != mStudies.end())
+            claimed->second.isMade = !known.contains(uid);
     }
     return Answer::Done;
 }
 
-QARecord::Answer QARecord::claimOne(const QByteArray& studyUID, bool isToBeMade, QString& reason)
+/// The destination is made when it is not there. Another study may have lost its last image and be gone meanwhile.
+QARecord::Answer QARecord::claimOne(const QByteArray& studyUID, bool isDestination, QString& reason)
 {
     using Making = Kxg::Catalogue::IfAbsent;
     std::unique_ptr<Kxg::StudyClaim> claim;
+    QVector<QByteArray> found;
     const Result result =
-        mCatalogue->claim(studyUID, kPatience, claim, isToBeMade ? Making::Create : Making::Fail);
+        mCatalogue->claim(studyUID, kPatience, claim, isDestination ? Making::Create : Making::Fail);
     const QString study = QString::fromLatin1(studyUID);
+    if (result.bad() && mCatalogue->findStudies(studyUID, 1, found).good() && !found.contains(studyUID))
+        return Answer::Done;
     if (result.bad()) {
         reason = QStringLiteral("Study %1 cannot be claimed: %2").arg(study, result.text());
         return Answer::Refused;
@@ -108,7 +115,6 @@ QARecord::Answer QARecord::claimOne(const QByteArray& studyUID, bool isToBeMade,
     }
     Study& claimed = mStudies[studyUID];
     claimed.claim = std::move(claim);
-    claimed.isMade = isToBeMade;
     return Answer::Done;
 }
 

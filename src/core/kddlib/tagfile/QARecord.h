@@ -75,7 +75,7 @@ private:
         std::vector<Kxg::ImageCorrection> corrections;
     };
 
-    Answer claimOne(const QByteArray& studyUID, bool isToBeMade, QString& reason);
+    Answer claimOne(const QByteArray& studyUID, bool isDestination, QString& reason);
     Result read();
     bool identify(const QAImageChange& change, Kxg::ImageCorrection& former);
     bool identifyByLog(const QAImageChange& change, Kxg::ImageCorrection& former);

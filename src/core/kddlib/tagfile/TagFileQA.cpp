@@ -75,7 +75,8 @@ bool TagFile::QAJob::run()
     const auto hasLabels = [](const TagFile& file) {
         return std::any_of(file.mSeries.cbegin(), file.mSeries.cend(), isLabelled);
     };
-    mIsLabelled = hasLabels(mDestination) || hasLabels(mSource);
+    mSourceHasLabels = hasLabels(mSource);
+    mDestinationHasLabels = hasLabels(mDestination.isEmpty() ? mSource : mDestination);
     if (!applyToImages())
         return false;
     const Stopwatch writing;
@@ -176,10 +177,10 @@ void TagFile::QAJob::tidy()
             forgetUnseen(*each.first->study());
     }
     // Labels are distinct only among the series that were there when they were made.
-    if (!mLeft.empty() && mIsLabelled) {
+    if (!mLeft.empty() && mDestinationHasLabels)
         mDestination.createAbstractTags();
+    if (!mLeft.empty() && mSourceHasLabels)
         mSource.createAbstractTags();
-    }
     mDestination.optimizeAll();
 }
 
