@@ -1,28 +1,30 @@
 #include "kddlib/TagFileGenerator.h"
 
 #include "kddlib/Limits.h"
+#include "kddlib/StudySources.h"
 #include "kddlib/net/KxCurlClient.h"
 #include "kddlib/net/KxDcmFileLoader.h"
 #include "kddlib/net/KxHttpStatus.h"
 #include "kddlib/previews/PreviewGenerator.h"
 #include "kddlib/previews/QuadrantNavigation.h"
+#include "kddlib/tagfile/CorrectedVolumes.h"
 #include "kddlib/tagfile/TagFile.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
+#include "kddlib/volumes/Volume.h"
 #include "kddlib/volumes/VolumeInfo.h"
 #include "platform/base/LogFile.h"
-#include "platform/database/Kxg.h"
 #include "platform/os/PathName.h"
 #include "platform/volumefile/OrlanMesh.h"
 
-#include <QHash>
+#include <QFile>
 #include <QMap>
+#include <QSet>
 
 #include <dcmtk/dcmdata/dcfilefo.h>
 
 #include <exception>
-#include <map>
 
 namespace Kdd
 {
@@ -75,60 +77,6 @@ std::unique_ptr<OrlanMesh> openVolume(const char* path)
 
 }  // namespace
 
-/// The datasets of a study as they were loaded, for the previews that are chosen once all are known. A dataset costs a
-/// hundred times what its tag map costs, so of large studies only the first are kept; the others are loaded again when
-/// they are chosen.
-class TagFileGenerator::KeptDatasets
-{
-public:
-    void keep(const QByteArray& sopUID, std::unique_ptr<DcmDataset> dataset)
-    {
-        // Of several files of one image the last one counts.
-        mDatasets.erase(sopUID);
-        if (mDatasets.size() < kMaxDatasets)
-            mDatasets.emplace(sopUID, std::move(dataset));
-    }
-
-    /// Null when it is not kept.
-    DcmDataset* find(const QByteArray& sopUID) const
-    {
-        const auto it = mDatasets.find(sopUID);
-        return it != mDatasets.end() ? it->second.get() : nullptr;
-    }
-
-private:
-    static constexpr std::size_t kMaxDatasets = 500;
-
-    std::map<QByteArray, std::unique_ptr<DcmDataset>> mDatasets;
-};
-
-/// Images that were loaded before the building began, by their paths.
-class TagFileGenerator::LoadedImages
-{
-public:
-    explicit LoadedImages(const TagFile& file)
-    {
-        for (const TagMap* image : file.imagesByUID())
-            mImages.insert(filePathOf(*image), image);
-    }
-
-    /// The image as it comes from the file; null when the file at the path is not among them.
-    std::unique_ptr<TagMap> copy(const std::string& path) const
-    {
-        const TagMap* image = mImages.value(QByteArray::fromStdString(path), nullptr);
-        std::unique_ptr<TagMap> copy(image != nullptr ? image->clone() : nullptr);
-        if (copy == nullptr)
-            return nullptr;
-        // Given anew when it is placed: attributes that come along would be placed otherwise than those given then.
-        copy->deleteElement(kFilePath);
-        copy->deleteElement(kFileSuffix);
-        return copy;
-    }
-
-private:
-    QHash<QByteArray, const TagMap*> mImages;
-};
-
 TagFileGenerator::TagFileGenerator()
     : TagFileGenerator(nullptr, true)
 {
@@ -168,35 +116,43 @@ bool TagFileGenerator::createTagFile(TagFile& tagFile, int studyId, const char* 
                                      const TagFile& loaded)
 {
     mLoadWatch = mVolumeWatch = mPreviewWatch = {};
+    mNumKept = mNumMissing = 0;
     tagFile.clear();
-    std::vector<std::string> dicomFiles;
-    std::vector<std::string> volumeFiles;
-    std::vector<std::string> seriesWithVolumeFile;
-    const Result query =
-        Kxg::GetAllFilesOfStudy(mUser, studyId, dicomFiles, volumeFiles, seriesWithVolumeFile);
-    if (query.bad()) {
-        LogFile::errorf("Database query GetAllFilesOfStudy() failed.");
-        LogFile::errorf("%s", qUtf8Printable(query.text()));
+    StudySources sources(loaded);
+    if (!sources.collect(mUser, studyId))
         return false;
-    }
-    KeptDatasets datasets;
-    const LoadedImages images(loaded);
-    for (const std::string& path : dicomFiles) {
-        if (std::unique_ptr<TagMap> image = images.copy(path))
-            addImage(tagFile, std::move(image), path, studyInstanceUID);
-        else
-            addDicomFile(tagFile, path, studyInstanceUID, datasets);
-    }
-    addVolumeInfo(tagFile, volumeFiles);
+    for (const std::string& path : sources.dicomFiles)
+        addFile(tagFile, path, studyInstanceUID, sources);
+    addVolumes(tagFile, sources.volumeFiles, sources);
     QList<QByteArray> chosen;
     tagFile.selectPreviewImages2D(chosen);
-    addPreviews(tagFile, chosen, datasets);
+    addPreviews(tagFile, chosen, sources);
     finishTree(tagFile);
-    for (const std::string& uid : seriesWithVolumeFile) {
+    for (const std::string& uid : sources.seriesWithVolumeFile) {
         if (TagMap* series = tagFile.findSeries(QByteArray::fromStdString(uid)))
             series->putAndInsertInt(kHasVolumeFile, 1);
     }
-    return tagFile.writeCacheFile();
+    return write(tagFile, sources);
+}
+
+bool TagFileGenerator::write(TagFile& tagFile, StudySources& sources)
+{
+    if (tagFile.isEmpty() && sources.dicomFiles.empty()) {
+        // Its images were moved away, and a volume file alone shows nothing.
+        TagFile abandoned;
+        const QByteArray& studyUID = sources.corrections.studyUID();
+        if (!QFile::exists(TagFile::cacheFilePathForStudy(studyUID.constData())))
+            return true;
+        const bool isHeld = abandoned.readCacheFileForStudy(studyUID.constData(), true);
+        abandoned.clear();
+        return isHeld && abandoned.writeCacheFile();
+    }
+    if (!tagFile.writeCacheFile())
+        return false;
+    const Result result = sources.adopted->finish();
+    if (result.bad())
+        LogFile::warnf("%s", qUtf8Printable(result.text()));
+    return true;
 }
 
 void TagFileGenerator::completeArrivals(TagFile& arrivals)
@@ -217,7 +173,7 @@ void TagFileGenerator::completeArrivals(TagFile& arrivals, TagFile& present)
             present.addTagMap(image->clone(), nullptr, true);
         present.selectPreviewImages2D(chosen);
     }
-    addPreviews(arrivals, chosen, KeptDatasets());
+    addPreviews(arrivals, chosen, StudySources(TagFile()));
     finishTree(arrivals);
 }
 
@@ -228,20 +184,45 @@ void TagFileGenerator::finishTree(TagFile& tagFile) const
         tagFile.optimizeAll();
 }
 
-void TagFileGenerator::addDicomFile(TagFile& tagFile, const std::string& path, const char* studyInstanceUID,
-                                    KeptDatasets& datasets)
+void TagFileGenerator::addFile(TagFile& tagFile, const std::string& path, const char* studyInstanceUID,
+                               StudySources& sources)
+{
+    const QByteArray name = QByteArray::fromStdString(path);
+    std::unique_ptr<TagMap> image;
+    const bool isUndecided = sources.adopted->undecided().contains(name);
+    if (!isUndecided) {
+        image = sources.loaded.copy(path);
+        if (image == nullptr)
+            image = load(path, sources);
+        if (image != nullptr && !sources.corrections.applyTo(*image, name))
+            image.reset();
+    }
+    if (image == nullptr) {
+        image = sources.formerImages.copy(path);
+        if (!isUndecided)
+            ++(image != nullptr ? mNumKept : mNumMissing);
+        if (image == nullptr)
+            return;
+        sources.kept.insert(name);
+        sources.corrections.applyToFormer(*image);
+    }
+    addImage(tagFile, std::move(image), path, studyInstanceUID);
+}
+
+/// The image as the file has it; null, with the reason logged, when it cannot be read.
+std::unique_ptr<TagMap> TagFileGenerator::load(const std::string& path, StudySources& sources)
 {
     const StopwatchSum::Running running(mLoadWatch);
     DcmFileFormat file;
     const OFCondition condition = loadDicomFile(path.c_str(), file);
     if (condition.bad()) {
         LogFile::errorf("Could not open %s: %s", path.c_str(), condition.text());
-        return;
+        return nullptr;
     }
-    std::unique_ptr<TagMap> map(TagMap::createTagMap(file.getDataset(), kDefaultValueBound));
-    const QByteArray sopUID = map->uid(TagMap::ImageLevel);
-    if (addImage(tagFile, std::move(map), path, studyInstanceUID))
-        datasets.keep(sopUID, std::unique_ptr<DcmDataset>(file.getAndRemoveDataset()));
+    std::unique_ptr<TagMap> image(TagMap::createTagMap(file.getDataset(), kDefaultValueBound));
+    sources.datasets.keep(QByteArray::fromStdString(path),
+                          std::unique_ptr<DcmDataset>(file.getAndRemoveDataset()));
+    return image;
 }
 
 /// False, with the reason logged, when the image belongs to another study.
@@ -267,7 +248,7 @@ bool TagFileGenerator::addImage(TagFile& tagFile, std::unique_ptr<TagMap> image,
 
 /// Of the images chosen those that are held.
 void TagFileGenerator::addPreviews(TagFile& tagFile, const QList<QByteArray>& chosen,
-                                   const KeptDatasets& datasets)
+                                   const StudySources& sources)
 {
     const StopwatchSum::Running running(mPreviewWatch);
     for (const QByteArray& sopUID : chosen) {
@@ -275,25 +256,53 @@ void TagFileGenerator::addPreviews(TagFile& tagFile, const QList<QByteArray>& ch
         if (image == nullptr)
             continue;
         const QByteArray path = filePathOf(*image);
-        if (DcmDataset* dataset = datasets.find(sopUID))
-            tagFile.addPreview(image, dataset, pathText(path));
-        else
-            tagFile.addPreview(image, path);
+        if (sources.kept.contains(path) && image->findElement(kPreview) != nullptr)
+            continue;
+        DcmFileFormat reloaded;
+        DcmDataset* dataset = sources.datasets.find(path);
+        if (dataset == nullptr && loadDicomFile(path.constData(), reloaded).good())
+            dataset = reloaded.getDataset();
+        tagFile.addPreview(image, dataset, pathText(path));
     }
 }
 
 void TagFileGenerator::addVolumeInfo(TagFile& tagFile, const std::vector<std::string>& volumeFiles)
 {
+    StudySources nothingElse((TagFile()));
+    addVolumes(tagFile, volumeFiles, nothingElse);
+}
+
+/// Volumes that are whole come first: the parts of others are numbered behind them.
+void TagFileGenerator::addVolumes(TagFile& tagFile, const std::vector<std::string>& volumeFiles,
+                                  StudySources& sources)
+{
+    const CorrectedVolumes corrected(tagFile, sources.corrections);
     QMap<QByteArray, std::vector<VolumeInfo*>> infosBySeries;
+    std::vector<std::unique_ptr<VolumeInfo>> divided;
+    QSet<QByteArray> unreadable;  // suffixes
     for (const std::string& path : volumeFiles) {
         QByteArray seriesUID;
-        if (VolumeInfo* info = createVolumeInfo(path.c_str(), seriesUID))
-            infosBySeries[seriesUID].push_back(info);
+        std::unique_ptr<VolumeInfo> info(createVolumeInfo(path.c_str(), seriesUID));
+        const QByteArray name = QByteArray::fromStdString(path);
+        if (info == nullptr) {
+            unreadable.insert(Volume::fileNameSuffix(name.mid(name.lastIndexOf('/') + 1).constData()));
+            continue;
+        }
+        const auto fate = corrected.update(*info, sources.corrections.isForeign(name));
+        const QByteArray holder = corrected.seriesOf(*info);
+        if (fate == CorrectedVolumes::Fate::Divided)
+            divided.push_back(std::move(info));
+        else if (fate == CorrectedVolumes::Fate::Whole)
+            infosBySeries[holder.isEmpty() ? seriesUID : holder].push_back(info.release());
     }
     for (const std::vector<VolumeInfo*>& infos : qAsConst(infosBySeries)) {
         tagFile.addVolumeInfo(infos);
         qDeleteAll(infos);
     }
+    for (const std::unique_ptr<VolumeInfo>& info : divided)
+        tagFile.addDividedVolume(*info);
+    if (!unreadable.isEmpty())
+        tagFile.keepVolumesOf(sources.former, unreadable);
 }
 
 VolumeInfo* TagFileGenerator::createVolumeInfo(const char* path, QByteArray& seriesInstanceUID)

@@ -16,13 +16,18 @@ namespace Kdd
 class OrlanMesh;
 class TagFile;
 class TagMap;
+struct StudySources;
 struct VolumeInfo;
 
 /// Builds the complete tag file of a study: images, volumes and previews, from the files that the image database lists
 /// for it (`Kxg::SetDatabaseServer`).
 ///
-/// A file that cannot be read is logged and left out, and the study is built from the others. What comes out depends on
-/// the files and their paths only, not on the database's engine or on the order in which they were registered.
+/// Corrections that the database knows are made again, so that an image shows what it showed before. Those that only the
+/// study's present tag file tells of are handed to the database first.
+///
+/// A file that cannot be read is logged. What the present tag file has of it is kept; where that has nothing, it is left
+/// out. But for that what comes out depends on the files, their paths and the corrections only, not on the database's
+/// engine or on the order in which they were registered.
 ///
 /// One generator builds one study at a time; several may work on several threads.
 class KDD_EXPORT TagFileGenerator
@@ -56,6 +61,11 @@ public:
     /// The same with the present cache file at hand; empty: there is none. Afterwards `present` shows the arrivals too.
     void completeArrivals(TagFile& arrivals, TagFile& present);
 
+    /// Of the images of the last build whose files could not be read: those that are as the earlier tag file had them,
+    /// and those that are missing.
+    int numKept() const { return mNumKept; }
+    int numMissing() const { return mNumMissing; }
+
     /// What loading DICOM files, reading volume files and making previews took in the last build [ms].
     void getTimings(int& loadMs, int& volumeMs, int& previewMs) const;
 
@@ -68,19 +78,21 @@ protected:
     VolumeInfo* createVolumeInfo(const char* path, QByteArray& seriesInstanceUID);
 
 private:
-    class KeptDatasets;
-    class LoadedImages;
-
-    void addDicomFile(TagFile& tagFile, const std::string& path, const char* studyInstanceUID,
-                      KeptDatasets& datasets);
+    void addFile(TagFile& tagFile, const std::string& path, const char* studyInstanceUID,
+                 StudySources& sources);
+    std::unique_ptr<TagMap> load(const std::string& path, StudySources& sources);
+    void addVolumes(TagFile& tagFile, const std::vector<std::string>& volumeFiles, StudySources& sources);
+    static bool write(TagFile& tagFile, StudySources& sources);
     static bool addImage(TagFile& tagFile, std::unique_ptr<TagMap> image, const std::string& path,
                          const char* studyInstanceUID);
-    void addPreviews(TagFile& tagFile, const QList<QByteArray>& chosen, const KeptDatasets& datasets);
+    void addPreviews(TagFile& tagFile, const QList<QByteArray>& chosen, const StudySources& sources);
     void addPreview(OrlanMesh& mesh, const char* path, VolumeInfo& info);
     void finishTree(TagFile& tagFile) const;
 
     QByteArray mUser;
     bool mOptimize = true;
+    int mNumKept = 0;
+    int mNumMissing = 0;
     StopwatchSum mLoadWatch;
     StopwatchSum mVolumeWatch;
     StopwatchSum mPreviewWatch;

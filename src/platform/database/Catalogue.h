@@ -199,7 +199,11 @@ public:
     /// The same, and keeps what the study now shows of itself and by what its tag file is recognised.
     virtual Kdd::Result finish(const BuiltStudy& built) = 0;
 
-    /// The same for a study that has neither files nor a tag file any more: forgets it, unless it got files meanwhile.
+    /// Keeps the same of a study whose tag file was changed in one respect, and takes back the one request that this
+    /// change left. Other requests stay: what they ask for is still to be done.
+    virtual Kdd::Result finishChange(const BuiltStudy& built, qint64 request) = 0;
+
+    /// As `finish` for a study that has neither files nor a tag file any more: forgets it, unless it got files meanwhile.
     virtual Kdd::Result finishRemoved() = 0;
 
 protected:

@@ -1,6 +1,7 @@
 #include "platform/database/Kxg.h"
 
 #include "platform/base/LogFile.h"
+#include "platform/database/CorrectionRows.h"
 #include "platform/database/QuestionConnection.h"
 #include "platform/database/SqlConnection.h"
 #include "platform/database/StudyContent.h"
@@ -104,6 +105,31 @@ Kdd::Result GetAllFilesOfStudy(const QByteArray& user, int studyId, std::vector<
         for (const QByteArray& path : qAsConst(files.volumes))
             volumeFiles.push_back(path.toStdString());
         seriesUIDs.assign(files.withVolume.begin(), files.withVolume.end());
+    });
+}
+
+Kdd::Result GetCorrections(int studyId, QByteArray& studyUID, std::vector<ImageCorrection>& corrections,
+                           std::vector<std::string>& foreignVolumes)
+{
+    return askDatabase([&](SqlConnection& connection) {
+        QByteArray uid;
+        {
+            SqlRows study = connection.ask("SELECT uid FROM study WHERE id = ?", {studyId});
+            if (study.next())
+                uid = study.text(0);
+        }
+        std::vector<std::string> foreign;
+        SqlRows rows = connection.ask("SELECT DISTINCT file.path FROM series JOIN volume_share"
+                                      " ON volume_share.series_id = series.id"
+                                      " JOIN file ON file.path = volume_share.path"
+                                      " JOIN series home ON home.id = file.series_id"
+                                      " WHERE series.study_id = ? AND home.study_id <> ? ORDER BY file.path",
+                                      {studyId, studyId});
+        while (rows.next())
+            foreign.push_back(rows.bytes(0).toStdString());
+        corrections = uid.isEmpty() ? std::vector<ImageCorrection>() : correctionsOf(connection, uid);
+        studyUID = uid;
+        foreignVolumes.swap(foreign);
     });
 }
 

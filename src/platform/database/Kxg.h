@@ -17,6 +17,8 @@
 namespace Kxg
 {
 
+struct ImageCorrection;
+
 // NOLINTBEGIN(readability-identifier-naming): named as the database's questions are.
 
 /// The database that all questions go to: "sqlite:FILE", "postgresql://[USER[:PASSWORD]@]HOST[:PORT]/DATABASE" or
@@ -31,6 +33,13 @@ KDD_EXPORT Kdd::Result GetAllFilesOfStudy(const QByteArray& user, int studyId,
                                           std::vector<std::string>& dicomFiles,
                                           std::vector<std::string>& volumeFiles,
                                           std::vector<std::string>& seriesUIDs);
+
+/// What corrections have to do with a study, the one of that UID: those of images that are or were in it, and the volume
+/// files listed for it that belong to other studies, because corrections brought images of them here. Nothing of a study
+/// that does not exist.
+KDD_EXPORT Kdd::Result GetCorrections(int studyId, QByteArray& studyUID,
+                                      std::vector<ImageCorrection>& corrections,
+                                      std::vector<std::string>& foreignVolumes);
 
 /// A study with all its series and their volume files; null in `study` when there is none of that UID.
 KDD_EXPORT Kdd::Result GetStudy(const QByteArray& studyUID, std::shared_ptr<DicomDirectoryEntry>& study);

@@ -85,12 +85,15 @@ public:
     Kdd::Result finish(const BuiltStudy& built) override
     {
         return conclude(built.isComplete ? mStudy.requests : QVector<qint64>(), [&] {
-            mConnection.change("UPDATE study SET tag_file_size = ?, tag_file_digest = ? WHERE id = ?",
-                               {built.tagFile.size, bytesValue(built.tagFile.digest), mStudyId});
-            describe(built.series);
+            keep(built);
             if (built.settleAt > 0)
                 leaveRequest(mConnection, mStudyId, built.settleAt);
         });
+    }
+
+    Kdd::Result finishChange(const BuiltStudy& built, qint64 request) override
+    {
+        return conclude({request}, [&] { keep(built); });
     }
 
     Kdd::Result finishRemoved() override
@@ -116,6 +119,13 @@ private:
                 work();
             });
         });
+    }
+
+    void keep(const BuiltStudy& built)
+    {
+        mConnection.change("UPDATE study SET tag_file_size = ?, tag_file_digest = ? WHERE id = ?",
+                           {built.tagFile.size, bytesValue(built.tagFile.digest), mStudyId});
+        describe(built.series);
     }
 
     void describe(const std::vector<DicomFileRecord>& series)

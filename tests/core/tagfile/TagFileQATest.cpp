@@ -273,6 +273,22 @@ TEST_P(RefusedEdit, ChangesNoImageAtAll)
 const Refused kRefused[] = {
     {"NoNumber", {DCM_Rows, QStringLiteral("eight")}, "\"eight\" is no number of VR US"},
     {"TooLargeANumber", {DCM_Rows, QStringLiteral("70000")}, "\"70000\" is no number"},
+    {"NoDate",
+     {DCM_StudyDate, QStringLiteral("20230229")},
+     "Image 1: Tag (0008,0020): \"20230229\" is no date"},
+    {"NoDateAmongDates",
+     {DCM_DateOfLastCalibration, QStringLiteral("20240101\\202401")},
+     "\"202401\" is no date"},
+    {"RangeOfDates", {DCM_PatientBirthDate, QStringLiteral("19700101-19710101")}, "is no date of VR DA"},
+    {"NoTime", {DCM_StudyTime, QStringLiteral("2460")}, "\"2460\" is no time"},
+    {"NoTimeEither", {DCM_StudyTime, QStringLiteral("12:30:00")}, "is no time"},
+    {"FractionOfAnHour", {DCM_StudyTime, QStringLiteral("12.5")}, "is no time"},
+    {"NoDateAndTime", {DCM_AcquisitionDateTime, QStringLiteral("20241301")}, "is no date and time of VR DT"},
+    {"NoZone", {DCM_AcquisitionDateTime, QStringLiteral("2024+1")}, "is no date and time"},
+    {"NoAge", {DCM_PatientAge, QStringLiteral("40 years")}, "is no age of VR AS"},
+    {"NoIntegerString", {DCM_InstanceNumber, QStringLiteral("1.5")}, "\"1.5\" is no number of VR IS"},
+    {"NoDecimalString", {DCM_SliceThickness, QStringLiteral("1,5")}, "\"1,5\" is no number of VR DS"},
+    {"NoFiniteNumber", {DCM_SliceThickness, QStringLiteral("inf")}, "\"inf\" is no number"},
     {"NoValue", {DCM_PatientID, QString()}, "(0010,0020) has no value"},
     {"Sequence", {DCM_ReferencedStudySequence, QStringLiteral("1")}, "(0008,1110): a value of VR SQ"},
     {"BinaryValue", {DCM_OverlayData, QStringLiteral("1")}, "cannot be replaced by a text"},
@@ -289,6 +305,27 @@ const Refused kRefused[] = {
     {"PrivateCreator", {DcmTagKey(0x0071, 0x0010), QStringLiteral("x")}, "reserves a private block"},
 };
 INSTANTIATE_TEST_SUITE_P(Table, RefusedEdit, testing::ValuesIn(kRefused), nameOf<Refused>);
+
+TEST_F(TagFileQAEdit, TakesEveryFormThatAValueMayHave)
+{
+    const QASubstitution values[] = {
+        {DCM_StudyDate, text("20240229")},
+        {DCM_StudyDate, text("")},
+        {DCM_StudyTime, text("23")},
+        {DCM_StudyTime, text("235960.123456")},
+        {DCM_StudyTime, text("1200 ")},
+        {DCM_AcquisitionDateTime, text("2024")},
+        {DCM_AcquisitionDateTime, text("202402-0500")},
+        {DCM_AcquisitionDateTime, text("20240229120000.5+1400")},
+        {DCM_PatientAge, text("018M")},
+        {DCM_InstanceNumber, text("-7")},
+        {DCM_ImagePositionPatient, text("1.5\\-2e3\\ 0 ")},
+    };
+    for (const QASubstitution& value : values) {
+        EXPECT_TRUE(apply(edit({"1"}, {value})));
+        EXPECT_EQ(shown("1.2", "1", value.key), value.value.toLatin1());
+    }
+}
 
 TEST_F(TagFileQAEdit, CannotTouchItsOwnAuditLog)
 {

@@ -182,6 +182,38 @@ TEST_P(CatalogueTest, WhatWasBuiltIsDescribedAndRecognised)
     EXPECT_TRUE(claimNext());
 }
 
+TEST_P(CatalogueTest, AChangeTakesBackItsOwnRequestOnly)
+{
+    add({dicom("/d/a", "1", "1.1", "x"), dicom("/d/b", "1", "1.1", "y")});
+    add(FileRecords{{}, {{"/d/v", {}, "1", "1.1"}}, {}});
+    auto claim = claimNext();
+    ASSERT_TRUE(claim && claim->finish().good());
+    claim.reset();
+    EXPECT_EQ(studies(), "1   1/2/1\n");
+    ASSERT_TRUE(catalogue().claim("1", 0, claim).good() && claim != nullptr);
+    for (const char* before : {"1 Roe  1/2/1\n", "1 Roe  1/2/1*\n"}) {
+        Requests requests;
+        ASSERT_TRUE(catalogue().recordCorrections({{"1", "x", "1", "1.1", "x", "changes"}}, requests).good());
+        BuiltStudy built;
+        built.series = {dicom("/d/a", "1", "1.1")};
+        built.series[0].patientName = "Roe";
+        EXPECT_EQ(claim->finishChange(built, requests.value("1")).text().toStdString(), "");
+        EXPECT_EQ(studies(), before);
+        ASSERT_TRUE(catalogue().requestBuild({"1"}).good());
+    }
+    Requests requests;
+    ASSERT_TRUE(catalogue().recordCorrections({{"1", "x", "2", "2.1", "x", "changes"}}, requests).good());
+    QByteArray study;
+    std::vector<ImageCorrection> corrections;
+    Paths foreign;
+    ASSERT_TRUE(GetCorrections(1, study, corrections, foreign).good());
+    EXPECT_TRUE(study == "1" && corrections.size() == 1 && foreign.empty());
+    ASSERT_TRUE(GetCorrections(2, study, corrections, foreign).good());
+    EXPECT_TRUE(study == "2" && corrections.size() == 1 && foreign == Paths{"/d/v"});
+    ASSERT_TRUE(GetCorrections(99, study, corrections, foreign).good());
+    EXPECT_TRUE(study.isEmpty() && corrections.empty() && foreign.empty());
+}
+
 TEST_P(CatalogueTest, ListsAreInTheOrderOfBytesWhateverTheOrderOfRegistering)
 {
     std::vector<DicomFileRecord> files = {

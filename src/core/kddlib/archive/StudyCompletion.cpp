@@ -126,7 +126,13 @@ CompletedStudy StudyCompletion::build(Kxg::StudyClaim& claim, const TagFile& loa
                                         : qUtf8Printable(whole.failure()));
         return {};
     }
-    return {succeeded(claim.finish(builtStudy(whole))), false, whole.statistics()};
+    // What could not be read stays as it was, and the next build tries again.
+    Kxg::BuiltStudy built = builtStudy(whole);
+    built.isComplete = generator.numKept() == 0 && generator.numMissing() == 0;
+    if (!built.isComplete)
+        LogFile::errorf("Study %s is built, but goes on waiting: %d files could not be read",
+                        studyUID.constData(), generator.numKept() + generator.numMissing());
+    return {succeeded(claim.finish(built)) && built.isComplete, false, whole.statistics()};
 }
 
 /// Volumes are made of images that may be anywhere in the study, and a correction may lead an arrival elsewhere: such

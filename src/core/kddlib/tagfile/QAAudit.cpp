@@ -10,6 +10,7 @@ namespace
 {
 
 const DcmTagKey kAuditLog(0x0071, 0x0021);
+const DcmTagKey kAuditTime(0x0071, 0x0022);
 
 constexpr int kKeyLength = 9;  // gggg-eeee
 
@@ -91,6 +92,21 @@ void AuditLog::append(const AuditEntry& entry)
     for (const AuditChange& change : entry.changes)
         mText += keyText(change.key) + '\n' + line(change.oldText) + line(change.newText);
     mText += '\n';
+}
+
+QVector<DcmTagKey> AuditLog::keysIn(const TagMap& image)
+{
+    QVector<DcmTagKey> keys;
+    const DcmTagKey last(kAuditLog.getGroup(), 0xffff);
+    const TagMap::iterator end = image.end();
+    for (auto it = image.lowerBound({kAuditLog.getGroup(), 0x1000}); it != end && it.key() <= last; ++it) {
+        const quint16 number = it.key().getElement() & 0xff;
+        const char* creator = image.privateCreator(it.key());
+        if ((number == kAuditLog.getElement() || number == kAuditTime.getElement()) &&
+            qstrcmp(creator, kOurPrivateCreator) == 0)
+            keys.append(it.key());
+    }
+    return keys;
 }
 
 bool AuditLog::store(TagMap& image) const

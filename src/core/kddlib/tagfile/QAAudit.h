@@ -54,6 +54,9 @@ public:
 
     void append(const AuditEntry& entry);
 
+    /// Where the image keeps its log and the time of its last entry, as far as it has them.
+    static QVector<DcmTagKey> keysIn(const TagMap& image);
+
     /// Replaces the log that the image holds. False when no private block is free.
     bool store(TagMap& image) const;
 

@@ -2,6 +2,7 @@
 
 #include "kddlib/items/TextDecoding.h"
 #include "kddlib/items/TextEncoding.h"
+#include "kddlib/tagfile/QAValues.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
@@ -237,6 +238,11 @@ QString QAEditor::substitute(const QASubstitution& substitution)
                                                 : element.value().isEmpty();
     if (isEqual)
         return {};
+    const QByteArray odd = firstOddValue(element.vr(), element.value());
+    if (!odd.isEmpty())
+        return QStringLiteral("Tag %1: \"%2\" is no %3 of VR %4")
+            .arg(keyName(key), QString::fromLatin1(odd), QLatin1String(kindOfValue(element.vr())),
+                 QLatin1String(vrName(element.vr())));
     mChanges.append({key, decode(key, mOldCharacterSet), substitution.value});
     mImage.putAndInsertValue(key, element.vr(), element.value());
     return {};

@@ -1,6 +1,7 @@
 #pragma once
 
 #include "kddlib/tagfile/QAEditor.h"
+#include "kddlib/tagfile/QARecord.h"
 #include "kddlib/tagfile/QASeriesMove.h"
 #include "kddlib/tagfile/TagFile.h"
 
@@ -37,6 +38,7 @@ private:
     {
         TagMap& image;
         QByteArray key;  // under which its tag file holds it
+        QByteArray seriesUID;
         AuditLog before;
         QVector<AuditChange> changes;
 
@@ -60,6 +62,9 @@ private:
     bool note(Edit& edit);
     void renewPreview(const Edit& edit);
 
+    enum class There { Nothing, Another, TheSame };
+
+    void keep(const Edit& edit, const TagFile& holder, const QByteArray& keyNow, There there);
     bool move(const Edit& edit);
     bool isMovedAlready(const Edit& edit, const TagMap& there) const;
     void dropFromOrigin(const Edit& edit);
@@ -67,8 +72,11 @@ private:
     QASeriesMove* takeVolumes(TagFile& file, TagMap& series);
 
     void tidy();
+    bool claim();
+    bool record();
     bool write();
-    bool takeBack();
+    bool failWriting(const QString& reason);
+    QString takeBack();
 
     bool fail(const QString& reason)
     {
@@ -83,11 +91,14 @@ private:
 
     TagFile& origin() { return mIsMove ? mSource : mDestination; }
 
+    QARecord mRecord;  // outlives the files: its claims go last
     TagFile mDestination;
     TagFile mSource;
     QAData& mJob;
     QString& mMessage;
     bool mIsMove = false;
+    bool mSourceHasLabels = false;
+    bool mDestinationHasLabels = false;  // or a new one is to have them
     bool mReordersImages = false;  // in volumes
     QString mTime;
     QByteArray mBefore;  // the destination's file, of a move

@@ -74,8 +74,6 @@ void TagFile::setMetaFolder(const char* path)
         LogFile::printf("Meta folder set to %s", sMetaFolder.constData());
 }
 
-/// The name under which an image is indexed: its SOP Instance UID, and where it has none its file path, in the form in
-/// which the database's paths are kept.
 QByteArray TagFile::imageKey(const TagMap& image)
 {
     const QByteArray sopUID = image.uid(TagMap::ImageLevel);

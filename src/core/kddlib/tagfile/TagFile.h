@@ -9,6 +9,7 @@
 #include <QHash>
 #include <QList>
 #include <QMap>
+#include <QSet>
 #include <QString>
 #include <QVector>
 
@@ -101,6 +102,9 @@ public:
 
     /// The same for a DICOM file. A file that cannot be loaded is logged and gives null.
     TagMap* addDicomFile(const char* file, const char* path, bool replace);
+
+    /// The name under which an image is known: its SOP Instance UID, and where it has none its file path.
+    static QByteArray imageKey(const TagMap& image);
 
     /// Owned by the tree; null when absent.
     TagMap* findSeries(const QByteArray& seriesUID) const;
@@ -209,6 +213,14 @@ public:
 
     /// Called when a study's volumes are complete; there is nothing left to do then.
     void createVolumes();
+
+    /// Adds what is left of a volume whose images a correction has divided, named in `info` as they are known here: to
+    /// each series that holds some of them a bare volume of these. Those that are not held stand elsewhere.
+    void addDividedVolume(const VolumeInfo& info);
+
+    /// Gives the images held here the volumes that another state of the same study has of volume files with these
+    /// suffixes, and what was divided of them. `former` has none any more then.
+    void keepVolumesOf(TagFile& former, const QSet<QByteArray>& suffixes);
 
     // ---- previews
 
@@ -334,7 +346,6 @@ private:
     class QAJob;
     class QAVolumes;
 
-    static QByteArray imageKey(const TagMap& image);
     void replaceImage(TagMap* old, TagMap& image, const QByteArray& seriesUID);
     void placeInSeries(TagMap* image, const QByteArray& seriesUID, const QByteArray& studyUID);
     void dropSeries(TagMap* series);

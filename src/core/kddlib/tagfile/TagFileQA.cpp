@@ -64,9 +64,14 @@ TagFile::QAJob::~QAJob()
 bool TagFile::QAJob::run()
 {
     const Stopwatch total;
-    if (!prepare() || !hold())
+    if (!prepare() || !claim() || !hold())
         return false;
     const int readMs = total.elapsed();
+    const auto hasLabels = [](const TagFile& file) {
+        return std::any_of(file.mSeries.cbegin(), file.mSeries.cend(), isLabelled);
+    };
+    mSourceHasLabels = hasLabels(mSource);
+    mDestinationHasLabels = hasLabels(mDestination.isEmpty() ? mSource : mDestination);
     if (!applyToImages())
         return false;
     const Stopwatch writing;
@@ -101,7 +106,16 @@ bool TagFile::QAJob::prepare()
     return true;
 }
 
-// ---- holding the files
+// ---- holding the studies
+
+/// Whoever builds a study claims it first and holds its file then.
+bool TagFile::QAJob::claim()
+{
+    QString reason;
+    const QARecord::Answer answer = mRecord.claim(mJob, reason);
+    mJob.outcome.isLockedOut = answer == QARecord::Answer::Later;
+    return answer == QARecord::Answer::Done || fail(reason);
+}
 
 /// All hold the files in the same order: two that each have what the other waits for would both give up.
 bool TagFile::QAJob::hold()
@@ -157,39 +171,67 @@ void TagFile::QAJob::tidy()
         if (each.first->study() != nullptr)
             forgetUnseen(*each.first->study());
     }
-    const QMap<QByteArray, TagMap*>& series = mDestination.mSeries;
-    if (!mLeft.empty() && std::any_of(series.cbegin(), series.cend(), isLabelled))
+    // Labels are distinct only among the series that were there when they were made.
+    if (!mLeft.empty() && mDestinationHasLabels)
         mDestination.createAbstractTags();
+    if (!mLeft.empty() && mSourceHasLabels)
+        mSource.createAbstractTags();
     mDestination.optimizeAll();
 }
 
-/// The destination comes first: at every moment each image stands in the one study, in the other or in both.
+bool TagFile::QAJob::record()
+{
+    QString reason;
+    const QARecord::Answer answer = mRecord.record(reason);
+    mJob.outcome.isLockedOut = answer == QARecord::Answer::Later;
+    return answer == QARecord::Answer::Done || fail(reason);
+}
+
+/// The image database comes first: what it knows the next build makes, whatever becomes of this process. Of the files
+/// the destination comes first: at every moment each image stands in the one study, in the other or in both.
 bool TagFile::QAJob::write()
 {
     tidy();
+    if (!record())
+        return false;
     QFile& file = mDestination.mCacheFile;
     const QString& path = mDestination.mCacheFilePath;
-    if (!mDestination.isEmpty() && !mDestination.writeInto(file, path, false))
-        return fail(mDestination.failure() +
-                    QLatin1String(mIsMove && hasJournal(path) ? kInBothStudies : ""));
-    if (!mIsMove)
-        return true;
-    if (mSource.isEmpty())
-        return mSource.writeCacheFile() || fail(mSource.failure() + QLatin1String(kInBothStudies));
-    return mSource.writeInto(mSource.mCacheFile, mSource.mCacheFilePath, false) || takeBack();
+    if (!mDestination.isEmpty() && !mDestination.writeInto(file, path, false)) {
+        if (mIsMove && hasJournal(path))
+            return fail(mDestination.failure() + QLatin1String(kInBothStudies));
+        return failWriting(mDestination.failure());
+    }
+    if (mIsMove && mSource.isEmpty()) {
+        if (!mSource.writeCacheFile())
+            return fail(mSource.failure() + QLatin1String(kInBothStudies));
+    } else if (mIsMove && !mSource.writeInto(mSource.mCacheFile, mSource.mCacheFilePath, false)) {
+        const QString failure = mSource.failure();
+        const QString left = takeBack();
+        return left.isEmpty() ? failWriting(failure) : fail(failure + left);
+    }
+    mRecord.finish(mDestination, mJob.studyUID);
+    if (mIsMove)
+        mRecord.finish(mSource, mJob.oldStudyUID);
+    return true;
+}
+
+/// With the files as they were.
+bool TagFile::QAJob::failWriting(const QString& reason)
+{
+    return fail(reason + mRecord.takeBack());
 }
 
 /// Makes the destination what it was, because the source could not be written. But what the source has a journal for
-/// is a promise, and its images will leave it.
-bool TagFile::QAJob::takeBack()
+/// is a promise, and its images will leave it. Empty, or where the images stand then.
+QString TagFile::QAJob::takeBack()
 {
     QFile& file = mDestination.mCacheFile;
     const QString& path = mDestination.mCacheFilePath;
-    QString reason = QLatin1String(kInBothStudies);
-    if (!hasJournal(mSource.mCacheFilePath))
-        reason = mBefore.isEmpty() ? removeWithJournal(file, path)
-                                   : writeInPlace(file, path, mBefore, {flushing(), Tail::Cut});
-    return fail(mSource.failure() + QLatin1String(reason.isEmpty() ? "" : kInBothStudies));
+    if (hasJournal(mSource.mCacheFilePath))
+        return QLatin1String(kInBothStudies);
+    const QString reason = mBefore.isEmpty() ? removeWithJournal(file, path)
+                                             : writeInPlace(file, path, mBefore, {flushing(), Tail::Cut});
+    return QLatin1String(reason.isEmpty() ? "" : kInBothStudies);
 }
 
 }  // namespace Kdd

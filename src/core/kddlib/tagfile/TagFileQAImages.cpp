@@ -1,4 +1,5 @@
 #include "kddlib/Limits.h"
+#include "kddlib/tagfile/ImageIdentity.h"
 #include "kddlib/tagfile/QAJob.h"
 #include "kddlib/tagfile/QAVolumes.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
@@ -30,15 +31,6 @@ bool isNoted(const AuditLog& log, const QString& time, const AuditChange& change
     });
 }
 
-/// Whether `log` goes on where `before` ends, and with these changes: then its image is the corrected one.
-bool isContinued(const AuditLog& before, const QVector<AuditChange>& changes, const AuditLog& log)
-{
-    QVector<AuditEntry> earlier;
-    QVector<AuditEntry> entries;
-    return log.text().startsWith(before.text()) && before.decode(earlier) && log.decode(entries) &&
-           entries.size() > earlier.size() && entries.at(earlier.size()).changes == changes;
-}
-
 }  // namespace
 
 bool movesImages(const DcmTagKey& key)
@@ -65,7 +57,7 @@ bool TagFile::QAJob::applyTo(const QByteArray& key)
 
 bool TagFile::QAJob::applyTo(TagMap& image, const QByteArray& key)
 {
-    Edit edit = {image, key, {}, {}};
+    Edit edit = {image, key, image.uid(TagMap::SeriesLevel), {}, {}};
     if (!edit.before.read(image))
         return failAt(key, QStringLiteral("its audit log is damaged"));
     if (mReordersImages)
@@ -79,7 +71,10 @@ bool TagFile::QAJob::applyTo(TagMap& image, const QByteArray& key)
         return false;
     const bool isMoved = std::any_of(edit.changes.cbegin(), edit.changes.cend(),
                                      [](const AuditChange& change) { return movesImages(change.key); });
-    return !isMoved || move(edit);
+    if (isMoved)
+        return move(edit);
+    keep(edit, origin(), key, There::Nothing);
+    return true;
 }
 
 QString TagFile::QAJob::substitute(Edit& edit) const
@@ -149,9 +144,12 @@ bool TagFile::QAJob::move(const Edit& edit)
     const QByteArray newKey = imageKey(edit.image);
     TagMap* there = target.findImage(newKey);
     ++mJob.outcome.moved;
-    if (there == nullptr || there == &edit.image)
+    if (there == nullptr || there == &edit.image) {
+        keep(edit, target, newKey, There::Nothing);
         return place(edit, target, newKey);
+    }
     if (isMovedAlready(edit, *there)) {
+        keep(edit, target, newKey, There::TheSame);
         dropFromOrigin(edit);
         return true;
     }
@@ -162,7 +160,14 @@ bool TagFile::QAJob::move(const Edit& edit)
     const QByteArray seriesUID = there->uid(TagMap::SeriesLevel);
     takeVolumes(target, *there->parent());
     mLeft.insert({&target, seriesUID});
+    keep(edit, target, newKey, There::Another);
     return place(edit, target, newKey);
+}
+
+void TagFile::QAJob::keep(const Edit& edit, const TagFile& holder, const QByteArray& keyNow, There there)
+{
+    mRecord.note({mIsMove ? mJob.oldStudyUID : mJob.studyUID, edit.seriesUID, edit.key, edit.before,
+                  edit.changes, &holder, keyNow, there == There::TheSame, there == There::Another});
 }
 
 /// An earlier run of the job may have ended when only the destination was written. What happened to the image there

@@ -1,0 +1,102 @@
+#include "kddlib/StudySources.h"
+
+#include "kddlib/tagmodel/OwnAttributes.h"
+#include "kddlib/tagmodel/TagMap.h"
+#include "platform/base/LogFile.h"
+#include "platform/database/Kxg.h"
+
+#include <algorithm>
+
+namespace Kdd
+{
+
+namespace
+{
+
+constexpr std::size_t kMaxDatasets = 500;
+
+/// Each waits 0.4 seconds for whoever holds the present tag file.
+constexpr int kReadingAttempts = 5;
+
+}  // namespace
+
+void KeptDatasets::keep(const QByteArray& path, std::unique_ptr<DcmDataset> dataset)
+{
+    if (mDatasets.size() < kMaxDatasets)
+        mDatasets.emplace(path, std::move(dataset));
+}
+
+DcmDataset* KeptDatasets::find(const QByteArray& path) const
+{
+    const auto it = mDatasets.find(path);
+    return it != mDatasets.end() ? it->second.get() : nullptr;
+}
+
+ImagesByPath::ImagesByPath(const TagFile& file)
+{
+    for (const TagMap* image : file.imagesByUID())
+        mImages.insert(filePathOf(*image), image);
+}
+
+std::unique_ptr<TagMap> ImagesByPath::copy(const std::string& path) const
+{
+    const TagMap* image = mImages.value(QByteArray::fromStdString(path), nullptr);
+    std::unique_ptr<TagMap> copy(image != nullptr ? image->clone() : nullptr);
+    for (const DcmTagKey& key : {kFilePath, kVolumeIndex, kFromDatabase, kHasVolumeFile, kAbstract}) {
+        if (copy != nullptr)
+            copy->deleteElement(key);
+    }
+    return copy;
+}
+
+bool StudySources::query(const QByteArray& user, int studyId)
+{
+    Result result = Kxg::GetAllFilesOfStudy(user, studyId, dicomFiles, volumeFiles, seriesWithVolumeFile);
+    if (result.bad())
+        LogFile::errorf("Database query GetAllFilesOfStudy() failed.");
+    else
+        result = corrections.read(studyId);
+    if (result.bad())
+        LogFile::errorf("%s", qUtf8Printable(result.text()));
+    return result.good();
+}
+
+/// A study that has no tag file yet, or a damaged one, has nothing to keep.
+bool StudySources::readFormer()
+{
+    const QByteArray& studyUID = corrections.studyUID();
+    bool isRead = false;
+    for (int i = 0; i < kReadingAttempts && !isRead && (i == 0 || former.wasLockedOut()); ++i)
+        isRead = former.readCacheFileForStudy(studyUID.constData(), false);
+    if (!isRead && former.wasLockedOut()) {
+        LogFile::errorf("The tag file of study %s cannot be read: others hold it", studyUID.constData());
+        return false;
+    }
+    formerImages = ImagesByPath(former);
+    return true;
+}
+
+bool StudySources::collect(const QByteArray& user, int studyId)
+{
+    if (!query(user, studyId) || !readFormer())
+        return false;
+    QSet<QByteArray> listed;
+    for (const std::string& path : dicomFiles)
+        listed.insert(QByteArray::fromStdString(path));
+    adopted = std::make_unique<AdoptedCorrections>(former, corrections, listed);
+    const Result result = adopted->record();
+    if (result.bad()) {
+        LogFile::errorf("The corrections of study %s cannot be kept: %s", corrections.studyUID().constData(),
+                        qUtf8Printable(result.text()));
+        return false;
+    }
+    if (adopted->isAny() && !query(user, studyId))
+        return false;
+    QList<QByteArray> unlisted = (adopted->undecided() - listed).values();
+    std::sort(unlisted.begin(), unlisted.end());
+    for (const QByteArray& path : qAsConst(unlisted))
+        dicomFiles.push_back(path.toStdString());
+    return true;
+}
+
+}  // namespace Kdd

@@ -1,0 +1,80 @@
+#pragma once
+
+#include "kddlib/tagfile/AdoptedCorrections.h"
+#include "kddlib/tagfile/BuildCorrections.h"
+#include "kddlib/tagfile/TagFile.h"
+
+#include <QHash>
+#include <QSet>
+
+#include <dcmtk/config/osconfig.h>
+
+#include <dcmtk/dcmdata/dcdatset.h>
+
+#include <map>
+#include <memory>
+#include <string>
+#include <vector>
+
+namespace Kdd
+{
+
+/// The datasets of a study as they were loaded, for the previews that are chosen once all are known. A dataset costs a
+/// hundred times what its tag map costs, so of large studies only the first are kept; the others are loaded again when
+/// they are chosen.
+class KeptDatasets
+{
+public:
+    void keep(const QByteArray& path, std::unique_ptr<DcmDataset> dataset);
+
+    /// Null when it is not kept.
+    DcmDataset* find(const QByteArray& path) const;
+
+private:
+    std::map<QByteArray, std::unique_ptr<DcmDataset>> mDatasets;  // by path
+};
+
+/// Images of a tag file, which must outlive the object, by the paths of their files.
+class ImagesByPath
+{
+public:
+    explicit ImagesByPath(const TagFile& file);
+
+    /// What the image shows, without its place in that tag file; null when the file at the path is not among them.
+    std::unique_ptr<TagMap> copy(const std::string& path) const;
+
+private:
+    QHash<QByteArray, const TagMap*> mImages;
+};
+
+/// What a study is built from.
+struct StudySources
+{
+    /// `loadedBefore` has images as they come from their files, and must outlive the object.
+    explicit StudySources(const TagFile& loadedBefore)
+        : loaded(loadedBefore)
+        , formerImages(former)
+    {
+    }
+
+    /// Asks the database and reads the study's present tag file. Corrections that only that one tells of are recorded
+    /// first, so that building has one source for all. False, with the reason logged, when something cannot be had.
+    bool collect(const QByteArray& user, int studyId);
+
+    std::vector<std::string> dicomFiles;
+    std::vector<std::string> volumeFiles;
+    std::vector<std::string> seriesWithVolumeFile;
+    BuildCorrections corrections;
+    ImagesByPath loaded;
+    TagFile former;  ///< the present tag file; empty when there is none that can be read
+    ImagesByPath formerImages;
+    std::unique_ptr<AdoptedCorrections> adopted;
+    QSet<QByteArray> kept;  ///< paths whose images are as the present tag file has them
+    KeptDatasets datasets;
+
+private:
+    bool query(const QByteArray& user, int studyId);
+    bool readFormer();
+};
+
+}  // namespace Kdd

@@ -1,0 +1,220 @@
+#pragma once
+
+#include "kddlib/TagFileGenerator.h"
+#include "kddlib/tagfile/QAData.h"
+#include "kddlib/tagfile/StudyRecord.h"
+#include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagmodel/TagMap.h"
+#include "platform/database/Catalogue.h"
+#include "platform/database/Kxg.h"
+#include "support/DatasetBuilder.h"
+#include "support/TemporaryStore.h"
+#include "support/TreeText.h"
+
+#include <QDir>
+#include <QFile>
+#include <QFileInfo>
+
+#include <gtest/gtest.h>
+
+#include <map>
+
+namespace Kdd
+{
+
+/// DICOM files, a database that lists them and the tag files that are built from both.
+class ArchiveTest : public testing::Test
+{
+protected:
+    using Uids = QList<QByteArray>;
+    using Substitutions = QVector<QASubstitution>;
+
+    /// With an embedded database unless there is one already.
+    explicit ArchiveTest(const QByteArray& address = QByteArray())
+    {
+        if (!address.isEmpty())
+            mAddress = address;
+        Kxg::SetDatabaseServer(mAddress);
+        Result result;
+        mCatalogue = Kxg::Catalogue::open(mAddress, result);
+        EXPECT_TRUE(result.good()) << qPrintable(result.text());
+    }
+    ~ArchiveTest() override { Kxg::SetDatabaseServer(QByteArray()); }
+
+    QByteArray path(const QByteArray& name) const { return mStore.folder().toLocal8Bit() + '/' + name; }
+
+    /// An image of series STUDY.1 unless said otherwise.
+    static DatasetBuilder image(const char* uid, const char* study)
+    {
+        const QByteArray series = QByteArray(study) + ".1";
+        return anImage(uid)
+            .inStudy(study)
+            .inSeries(series.constData())
+            .with(DCM_PatientName, "Doe^J")
+            .with(DCM_InstanceNumber, "1");
+    }
+
+    void save(const DatasetBuilder& image, const QByteArray& name)
+    {
+        DcmFileFormat file(&image.dataset());
+        ASSERT_TRUE(file.saveFile(path(name).constData(), EXS_LittleEndianExplicit).good());
+        const std::unique_ptr<TagMap> map(image.map());
+        registerFiles({{fileRecord(*map, path(name), {})}, {}, {}});
+    }
+
+    void save(const char* uid, const char* study) { save(image(uid, study), uid); }
+
+    void registerFiles(const Kxg::FileRecords& files)
+    {
+        QMap<QByteArray, qint64> requests;
+        const Result result = mCatalogue->registerFiles(files, requests);
+        ASSERT_TRUE(result.good()) << qPrintable(result.text());
+    }
+
+    /// As a worker does it.
+    void build(const QByteArray& study)
+    {
+        std::unique_ptr<Kxg::StudyClaim> claim;
+        ASSERT_TRUE(mCatalogue->claim(study, 0, claim).good() && claim != nullptr);
+        Kxg::StudyContents contents;
+        ASSERT_TRUE(mCatalogue->studyContents(study, contents).good());
+        if (contents.images.empty() && contents.volumes.isEmpty()) {
+            QFile::remove(TagFile::cacheFilePathForStudy(study.constData()));
+            EXPECT_TRUE(claim->finishRemoved().good());
+            return;
+        }
+        TagFile file;
+        mGenerator = {};
+        EXPECT_TRUE(mGenerator.createTagFile(file, claim->studyId(), study.constData()));
+        EXPECT_TRUE(claim->finish(builtStudy(file)).good());
+    }
+
+    /// All studies that there are in the database.
+    Uids studies()
+    {
+        std::vector<Kxg::StudySummary> list;
+        EXPECT_TRUE(mCatalogue->listStudies(list).good());
+        Uids uids;
+        for (const Kxg::StudySummary& study : list)
+            uids.append(study.studyInstanceUID);
+        return uids;
+    }
+
+    void buildAll()
+    {
+        for (const QByteArray& study : studies())
+            build(study);
+    }
+
+    int waiting()
+    {
+        int count = -1;
+        EXPECT_TRUE(mCatalogue->countWaiting(count).good());
+        return count;
+    }
+
+    static QAData edit(const Uids& images, const Substitutions& substitutions, const char* study = "1")
+    {
+        QAData job;
+        job.studyUID = study;
+        job.substitutions = substitutions;
+        job.timestamp = "20240131120000";
+        job.login = "anna";
+        job.images = images;
+        return job;
+    }
+
+    /// To series STUDY.5 of another study.
+    static QAData move(const Uids& images, const char* from, const char* to, Substitutions more = {})
+    {
+        more.append({DCM_SeriesInstanceUID, QString::fromLatin1(QByteArray(to) + ".5")});
+        QAData job = edit(images, more, to);
+        job.oldStudyUID = from;
+        return job;
+    }
+
+    static void correct(QAData job)
+    {
+        QString message;
+        EXPECT_TRUE(TagFile::applyQA(job, message)) << message.toStdString();
+        EXPECT_TRUE(job.outcome.notFound.isEmpty());
+    }
+
+    static std::string refusal(QAData job)
+    {
+        QString message;
+        EXPECT_FALSE(TagFile::applyQA(job, message));
+        return message.toStdString();
+    }
+
+    /// Every image of the studies and what it shows, with the VRs.
+    static std::string shown(const Uids& studies)
+    {
+        std::string all;
+        for (const QByteArray& study : studies) {
+            TagFile file;
+            file.readCacheFileForStudy(study.constData(), false);
+            all += study.toStdString() + ":\n" + imagesText(file);
+        }
+        return all;
+    }
+
+    static Uids imagesIn(const char* study)
+    {
+        TagFile file;
+        file.readCacheFileForStudy(study, false);
+        return file.imagesByUID().keys();
+    }
+
+    static QByteArray value(const char* study, const char* uid, const DcmTagKey& key)
+    {
+        TagFile file;
+        file.readCacheFileForStudy(study, false);
+        QByteArray text;
+        const TagMap* found = file.findImage(uid);
+        return found != nullptr && found->findAndGetString(key, text) ? text : QByteArray("none");
+    }
+
+    /// Whatever is built again, every image shows what it showed.
+    void expectSurvival(const Uids& of)
+    {
+        const std::string before = shown(of);
+        buildAll();
+        EXPECT_EQ(shown(of), before);
+    }
+
+    using Files = std::map<QByteArray, QByteArray>;
+
+    /// The tag files of the studies, and putting them back as if a process had died before it wrote them.
+    static Files tagFiles(const Uids& studies)
+    {
+        Files files;
+        for (const QByteArray& study : studies) {
+            QFile file(TagFile::cacheFilePathForStudy(study.constData()));
+            if (file.open(QIODevice::ReadOnly))
+                files[study] = file.readAll();
+        }
+        return files;
+    }
+
+    static void putBack(const Uids& studies, const Files& files)
+    {
+        for (const QByteArray& study : studies) {
+            QFile file(TagFile::cacheFilePathForStudy(study.constData()));
+            file.remove();
+            const auto content = files.find(study);
+            if (content == files.end())
+                continue;
+            QDir().mkpath(QFileInfo(file).path());
+            ASSERT_TRUE(file.open(QIODevice::WriteOnly));
+            file.write(content->second);
+        }
+    }
+
+    TemporaryStore mStore;
+    QByteArray mAddress = "sqlite:" + mStore.filePath("catalogue.db").toUtf8();
+    std::unique_ptr<Kxg::Catalogue> mCatalogue;
+    TagFileGenerator mGenerator;
+};
+
+}  // namespace Kdd

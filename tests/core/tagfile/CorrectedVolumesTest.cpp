@@ -1,0 +1,111 @@
+#include "ArchiveFixture.h"
+#include "kddlib/volumes/Volume.h"
+#include "platform/volumefile/OrlanMeshWriter.h"
+#include "platform/volumefile/SOPInstanceUtility.h"
+#include "support/LogCapture.h"
+
+namespace Kdd
+{
+namespace
+{
+
+/// A study whose images a volume file holds.
+class CorrectedVolumes : public ArchiveTest
+{
+protected:
+    CorrectedVolumes()
+    {
+        for (const char* uid : {"a", "b", "c"})
+            save(uid, "1");
+        save("z", "2");
+        writeVolume({"a", "b", "c"});
+        registerFiles({{}, {{path("1.1-stack.vol"), {}, "1", "1.1"}}, {}});
+        buildAll();
+    }
+
+    void writeVolume(const std::vector<std::string>& sopUIDs)
+    {
+        Result result;
+        const int slices = static_cast<int>(sopUIDs.size());
+        const auto writer = OrlanMeshWriter::create(
+            path("1.1-stack.vol"), {"Level0", {2, 2, slices}, PrimitiveType::UInt8, 1}, result);
+        ASSERT_NE(writer, nullptr) << qPrintable(result.text());
+        for (int z = 0; z < slices; ++z)
+            ASSERT_TRUE(
+                writer->writeSlice(z, TypedData2D{2, 2, 1, PrimitiveType::UInt8, QByteArray(4, '1')}).good());
+        ParamBundle dicom;
+        dicom.insert("G0020-000E", Parameter::ofText("UI:1.1"));
+        ParamBundle parameters;
+        parameters.insertBundle("DICOM", dicom);
+        parameters.insertBundle("SOPInstanceUIDs", SOPInstanceUtility::bundleOf(sopUIDs));
+        ASSERT_TRUE(writer->writeParameters(parameters).good());
+        ASSERT_TRUE(writer->finish().good());
+    }
+
+    /// "1.1: a b c (stack)" for every volume; one that is divided has no geometry.
+    static std::string volumes()
+    {
+        std::string all;
+        for (const char* study : {"1", "2"}) {
+            TagFile file;
+            file.readCacheFileForStudy(study, false);
+            for (auto it = file.seriesByUID().cbegin(); it != file.seriesByUID().cend(); ++it) {
+                for (const Volume* volume : it.value()->volumes()) {
+                    all += it.key().toStdString() + ":";
+                    for (const std::string& slice : volume->sopUIDList())
+                        all += ' ' + slice;
+                    all += volume->isBareVolume() ? " bare" : " whole";
+                    all += " (" + volume->fileNameSuffix().toStdString() + ")\n";
+                }
+            }
+        }
+        return all;
+    }
+
+    void expectVolumes(const std::string& expected)
+    {
+        EXPECT_EQ(volumes(), expected) << "after the correction";
+        const LogCapture log;
+        buildAll();
+        EXPECT_EQ(volumes(), expected) << "after a build";
+        EXPECT_EQ(log.count("unknown image"), 0);
+    }
+};
+
+TEST_F(CorrectedVolumes, WhoseImagesAllMoveGoAlong)
+{
+    correct(edit({"a"}, {{DCM_SOPInstanceUID, QStringLiteral("a2")}}));
+    expectVolumes("1.1: a2 b c whole (stack)\n");
+    correct(edit({"a2", "b", "c"}, {{DCM_SeriesInstanceUID, QStringLiteral("1.7")}}));
+    expectVolumes("1.7: a2 b c whole (stack)\n");
+    correct(move({"a2", "b", "c"}, "1", "2"));
+    expectVolumes("2.5: a2 b c whole (stack)\n");
+}
+
+TEST_F(CorrectedVolumes, ThatAreDividedHaveOnlyImagesAndSlices)
+{
+    correct(move({"b"}, "1", "2", {{DCM_SOPInstanceUID, QStringLiteral("b2")}}));
+    expectVolumes("1.1: a c bare ()\n2.5: b2 bare ()\n");
+    correct(edit({"a"}, {{DCM_SeriesInstanceUID, QStringLiteral("1.7")}}));
+    expectVolumes("1.1: c bare ()\n1.7: a bare ()\n2.5: b2 bare ()\n");
+}
+
+TEST_F(CorrectedVolumes, WhoseFileCannotBeReadStayAsTheyWere)
+{
+    ASSERT_TRUE(QFile::remove(QString::fromLocal8Bit(path("1.1-stack.vol"))));
+    expectVolumes("1.1: a b c whole (stack)\n");
+    correct(move({"b"}, "1", "2"));
+    expectVolumes("1.1: a c bare ()\n2.5: b bare ()\n");
+}
+
+TEST_F(CorrectedVolumes, ThatAreLeftAloneMakeNoTagFile)
+{
+    correct(move({"a", "b", "c"}, "1", "2"));
+    EXPECT_EQ(imagesIn("1"), Uids());
+    build("1");
+    EXPECT_FALSE(QFile::exists(TagFile::cacheFilePathForStudy("1")));
+    EXPECT_EQ(waiting(), 0);
+}
+
+}  // namespace
+}  // namespace Kdd

@@ -1,0 +1,361 @@
+#include "ArchiveFixture.h"
+#include "kddlib/tagfile/ImageOverlay.h"
+#include "kddlib/tagfile/QAAudit.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
+#include "kddlib/tagmodel/TagElement.h"
+#include "support/LogCapture.h"
+#include "support/PostgresServer.h"
+
+#include <sys/resource.h>
+
+#include <csignal>
+#include <thread>
+
+namespace Kdd
+{
+namespace
+{
+
+/// Corrections of studies that are built again afterwards.
+class RebuiltCorrections : public ArchiveTest
+{
+protected:
+    RebuiltCorrections()
+    {
+        for (const char* uid : {"a", "b", "c"})
+            save(uid, "1");
+        save("z", "2");
+        buildAll();
+        EXPECT_EQ(waiting(), 0);
+    }
+
+    const Uids mAll = {"1", "2", "3"};
+};
+
+TEST_F(RebuiltCorrections, EditsStayWithTheirLogs)
+{
+    correct(edit({"a", "b"},
+                 {{DCM_PatientName, QStringLiteral("Roe^R")}, {DCM_InstanceNumber, QStringLiteral("")}}));
+    correct(edit({"a"},
+                 {{DCM_PatientName, QStringLiteral("Poe^P")}, {DCM_ImageComments, QStringLiteral("new")}}));
+    EXPECT_EQ(waiting(), 0);
+    expectSurvival(mAll);
+    EXPECT_EQ(value("1", "a", DCM_PatientName), "Poe^P");
+    EXPECT_EQ(value("1", "b", DCM_PatientName), "Roe^R");
+    EXPECT_EQ(value("1", "c", DCM_PatientName), "Doe^J");
+    std::vector<Kxg::StudySummary> list;
+    ASSERT_TRUE(mCatalogue->listStudies(list).good());
+    EXPECT_EQ(list.front().patientName, "Poe^P");
+}
+
+TEST_F(RebuiltCorrections, MovesStay)
+{
+    correct(move({"a", "b"}, "1", "2", {{DCM_PatientName, QStringLiteral("Roe^R")}}));
+    correct(move({"c"}, "1", "3", {{DCM_SOPInstanceUID, QStringLiteral("c2")}}));
+    EXPECT_EQ(waiting(), 0);
+    EXPECT_EQ(studies(), (Uids{"2", "3"})) << "nothing is left of the first one";
+    expectSurvival(mAll);
+    EXPECT_EQ(imagesIn("2"), (Uids{"a", "b", "z"}));
+    EXPECT_EQ(imagesIn("3"), Uids{"c2"});
+}
+
+TEST_F(RebuiltCorrections, AChainOfMovesAndEditsEndsWhereItEnded)
+{
+    correct(edit({"a"}, {{DCM_PatientName, QStringLiteral("Roe^R")}}));
+    correct(move({"a"}, "1", "2", {{DCM_SOPInstanceUID, QStringLiteral("a2")}}));
+    expectSurvival(mAll);
+    correct(move({"a2"}, "2", "3", {{DCM_SOPInstanceUID, QStringLiteral("a3")}}));
+    correct(edit({"a3"}, {{DCM_ImageComments, QStringLiteral("end")}}, "3"));
+    expectSurvival(mAll);
+    EXPECT_EQ(imagesIn("3"), Uids{"a3"});
+    EXPECT_EQ(value("3", "a3", DCM_PatientName), "Roe^R");
+    correct(move({"a3"}, "3", "1", {{DCM_SOPInstanceUID, QStringLiteral("a")}}));
+    expectSurvival(mAll);
+    EXPECT_EQ(imagesIn("1"), (Uids{"a", "b", "c"}));
+}
+
+TEST_F(RebuiltCorrections, AMoveOntoAnImageOfTheSameUidTakesItsPlace)
+{
+    const LogCapture quiet;
+    save(image("a", "2").with(DCM_ImageComments, "of 2"), "a-of-2");
+    buildAll();
+    correct(edit({"a"}, {{DCM_PatientName, QStringLiteral("Two")}}, "2"));
+    correct(move({"a"}, "1", "2"));
+    correct(edit({"a"}, {{DCM_PatientName, QStringLiteral("One")}}, "2"));
+    EXPECT_EQ(value("2", "a", DCM_ImageComments), "none");
+    expectSurvival(mAll);
+    EXPECT_EQ(imagesIn("2"), (Uids{"a", "z"}));
+    EXPECT_EQ(value("2", "a", DCM_PatientName), "One");
+}
+
+TEST_F(RebuiltCorrections, WhatWasMovedAndDeletedDoesNotComeBack)
+{
+    correct(move({"a"}, "1", "2"));
+    ASSERT_TRUE(mCatalogue->removeImage("2", "a").good());
+    buildAll();
+    EXPECT_EQ(imagesIn("1") + imagesIn("2"), (Uids{"b", "c", "z"}));
+}
+
+TEST_F(RebuiltCorrections, AFileThatArrivesAgainUnderItsFormerStudyFollows)
+{
+    correct(move({"a"}, "1", "2", {{DCM_PatientName, QStringLiteral("Roe^R")}}));
+    save(image("a", "1").with(DCM_ImageComments, "sent again"), "again");
+    buildAll();
+    EXPECT_EQ(imagesIn("1") + imagesIn("2"), (Uids{"b", "c", "a", "z"}));
+    EXPECT_EQ(value("2", "a", DCM_PatientName), "Roe^R");
+    EXPECT_EQ(value("2", "a", DCM_ImageComments), "sent again");
+}
+
+/// As if the process had died once the database knew the correction, and before or after the one tag file was written.
+TEST_F(RebuiltCorrections, WhatIsInterruptedIsCompletedByABuildOrByTheJobAgain)
+{
+    const QAData jobs[] = {edit({"a"}, {{DCM_PatientName, QStringLiteral("Roe^R")}}),
+                           edit({"a"}, {{DCM_SeriesInstanceUID, QStringLiteral("1.7")}}),
+                           move({"a", "b"}, "1", "2", {{DCM_PatientName, QStringLiteral("Poe^P")}}),
+                           move({"a"}, "2", "3", {{DCM_SOPInstanceUID, QStringLiteral("a3")}})};
+    for (const QAData& job : jobs) {
+        const Files before = tagFiles(mAll);
+        correct(job);
+        const std::string after = shown(mAll);
+        const Files written = tagFiles(mAll);
+        for (const Uids& unwritten : {mAll, Uids{job.oldStudyUID}}) {
+            putBack(mAll, written);
+            putBack(unwritten, before);
+            QAData again = job;
+            QString message;
+            EXPECT_TRUE(TagFile::applyQA(again, message)) << message.toStdString();
+            EXPECT_EQ(shown(mAll), after);
+            putBack(unwritten, before);
+            buildAll();
+            EXPECT_EQ(shown(mAll), after);
+        }
+        std::vector<Kxg::ImageCorrection> rows;
+        ASSERT_TRUE(mCatalogue->corrections("3", rows).good());
+        EXPECT_LE(rows.size(), 1U);
+    }
+}
+
+TEST_F(RebuiltCorrections, AnotherJobWaitsUntilTheInterruptedOneIsBuilt)
+{
+    const Files before = tagFiles(mAll);
+    correct(edit({"a"}, {{DCM_PatientName, QStringLiteral("Roe^R")}}));
+    putBack(mAll, before);
+    const QAData next = edit({"a"}, {{DCM_ImageComments, QStringLiteral("next")}});
+    EXPECT_NE(refusal(next).find("study 1 is to be built first"), std::string::npos);
+    EXPECT_EQ(waiting(), 1);
+    build("1");
+    correct(next);
+    EXPECT_EQ(value("1", "a", DCM_PatientName), "Roe^R");
+    expectSurvival(mAll);
+}
+
+TEST_F(RebuiltCorrections, WhatCannotBeWrittenIsNotKeptEither)
+{
+    constexpr int kLarge = 3000000;
+    const LogCapture quiet;
+    const QByteArray pixels(kLarge, '\x5a');
+    DatasetBuilder large = image("large", "1");
+    large.dataset().putAndInsertUint8Array(DcmTagKey(0x6000, 0x3000),
+                                           reinterpret_cast<const Uint8*>(pixels.constData()), kLarge);
+    save(large, "large");
+    TagFile::setCompressionMode(TagFile::CompressionMode::None);
+    buildAll();
+    correct(edit({"b"}, {{DCM_PatientName, QStringLiteral("Roe^R")}}));
+    const std::string before = shown(mAll);
+    std::signal(SIGXFSZ, SIG_IGN);
+    rlimit former = {};
+    ::getrlimit(RLIMIT_FSIZE, &former);
+    const rlimit limit = {2000000, former.rlim_max};
+    ::setrlimit(RLIMIT_FSIZE, &limit);
+    EXPECT_NE(refusal(edit({"a", "b"}, {{DCM_PatientName, QStringLiteral("Poe^P")}})), "");
+    EXPECT_NE(refusal(move({"a", "b"}, "1", "3", {{DCM_SOPInstanceUID, QStringLiteral("x")}})), "")
+        << "two of one UID";
+    EXPECT_NE(refusal(move({"a", "b"}, "1", "3")), "");
+    ::setrlimit(RLIMIT_FSIZE, &former);
+    EXPECT_EQ(shown(mAll), before);
+    EXPECT_EQ(waiting(), 0);
+    EXPECT_EQ(studies(), (Uids{"1", "2"}));
+    expectSurvival(mAll);
+    TagFile::setCompressionMode(TagFile::CompressionMode::Zlib);
+}
+
+TEST_F(RebuiltCorrections, WithoutItsDatabaseACorrectionIsRefused)
+{
+    const std::string before = shown(mAll);
+    Kxg::SetDatabaseServer("sqlite:/proc/none/catalogue.db");
+    EXPECT_NE(refusal(edit({"a"}, {{DCM_PatientName, QStringLiteral("Roe^R")}})).find("could not be kept"),
+              std::string::npos);
+    Kxg::SetDatabaseServer(mAddress);
+    std::unique_ptr<Kxg::StudyClaim> claim;
+    ASSERT_TRUE(mCatalogue->claim("2", 0, claim).good() && claim != nullptr);
+    QAData job = move({"a"}, "1", "2");
+    QString message;
+    EXPECT_FALSE(TagFile::applyQA(job, message));
+    EXPECT_TRUE(job.outcome.isLockedOut) << message.toStdString();
+    EXPECT_EQ(shown(mAll), before);
+}
+
+TEST_F(RebuiltCorrections, WhatWaitedBeforeGoesOnWaiting)
+{
+    save("d", "1");
+    correct(edit({"a"}, {{DCM_PatientName, QStringLiteral("Roe^R")}}));
+    correct(move({"a", "b", "c"}, "1", "2"));
+    EXPECT_EQ(imagesIn("1"), Uids());
+    EXPECT_EQ(waiting(), 1);
+    buildAll();
+    EXPECT_EQ(imagesIn("1"), Uids{"d"});
+}
+
+TEST_F(RebuiltCorrections, ThoseThatOnlyTheTagFileTellsOfAreAdopted)
+{
+    Kxg::SetDatabaseServer(QByteArray());
+    correct(edit({"a"}, {{DCM_PatientName, QStringLiteral("Roe^R")}}));
+    correct(edit({"b"}, {{DCM_SOPInstanceUID, QStringLiteral("b2")}}));
+    correct(move({"c"}, "1", "2", {{DCM_SOPInstanceUID, QStringLiteral("c2")}}));
+    Kxg::SetDatabaseServer(mAddress);
+    const std::string before = shown(mAll);
+    build("2");
+    build("1");
+    EXPECT_EQ(shown(mAll), before);
+    EXPECT_EQ(waiting(), 0);
+    correct(edit({"a"}, {{DCM_ImageComments, QStringLiteral("next")}}));
+    expectSurvival(mAll);
+    Kxg::SetDatabaseServer(QByteArray());
+    correct(edit({"a"}, {{DCM_PatientID, QStringLiteral("17")}}));
+    Kxg::SetDatabaseServer(mAddress);
+    expectSurvival(mAll);
+    EXPECT_EQ(value("1", "a", DCM_ImageComments), "next");
+}
+
+TEST_F(RebuiltCorrections, AJobOnWhatIsNotAdoptedYetKeepsAllOfIt)
+{
+    Kxg::SetDatabaseServer(QByteArray());
+    correct(edit({"a"}, {{DCM_PatientName, QStringLiteral("Roe^R")}}));
+    correct(move({"c"}, "1", "2", {{DCM_SOPInstanceUID, QStringLiteral("c2")}}));
+    Kxg::SetDatabaseServer(mAddress);
+    correct(edit({"a"}, {{DCM_ImageComments, QStringLiteral("next")}}));
+    correct(edit({"c2"}, {{DCM_ImageComments, QStringLiteral("next")}}, "2"));
+    expectSurvival(mAll);
+    EXPECT_EQ(imagesIn("1") + imagesIn("2"), (Uids{"a", "b", "c2", "z"}));
+}
+
+TEST_F(RebuiltCorrections, AnImageWhoseFileCannotBeReadStaysAsItWas)
+{
+    const LogCapture log;
+    correct(edit({"a"}, {{DCM_PatientName, QStringLiteral("Roe^R")}}));
+    save("d", "1");
+    for (const char* name : {"a", "b", "d"})
+        QFile::remove(QString::fromLocal8Bit(path(name)));
+    const std::string before = shown(mAll);
+    build("1");
+    EXPECT_EQ(shown(mAll), before);
+    EXPECT_EQ(log.count("Could not open " + path("b").toStdString() + ": "), 1);
+    EXPECT_EQ(mGenerator.numKept(), 2);
+    EXPECT_EQ(mGenerator.numMissing(), 1);
+}
+
+TEST_F(RebuiltCorrections, AnImageWithoutUidIsKnownByItsPath)
+{
+    save(image("x", "1").without(DCM_SOPInstanceUID), "nameless");
+    buildAll();
+    correct(move({path("nameless")}, "1", "2", {{DCM_PatientName, QStringLiteral("Roe^R")}}));
+    expectSurvival(mAll);
+    EXPECT_EQ(imagesIn("2").size(), 2);
+    correct(edit({path("nameless")}, {{DCM_SOPInstanceUID, QStringLiteral("named")}}, "2"));
+    expectSurvival(mAll);
+    EXPECT_EQ(value("2", "named", DCM_PatientName), "Roe^R");
+}
+
+TEST_F(RebuiltCorrections, MovesInOppositeDirectionsAtOnceLoseNothing)
+{
+    const LogCapture quiet;
+    const auto moveAll = [](const char* from, const char* to) {
+        for (const char* uid : {"a", "b", "c", "z"}) {
+            QAData job = move({uid}, from, to);
+            QString message;
+            while (!TagFile::applyQA(job, message) && job.outcome.isLockedOut) {
+            }
+            EXPECT_EQ(message, QString());
+        }
+    };
+    std::thread there(moveAll, "1", "2");
+    std::thread back(moveAll, "2", "1");
+    there.join();
+    back.join();
+    EXPECT_EQ(imagesIn("1").size() + imagesIn("2").size(), 4);
+    expectSurvival(mAll);
+}
+
+/// The same on a server.
+class RebuiltCorrectionsOnServer : public ArchiveTest
+{
+protected:
+    RebuiltCorrectionsOnServer()
+        : ArchiveTest(newPostgresDatabase())
+    {
+    }
+};
+
+TEST_F(RebuiltCorrectionsOnServer, StayWithTheirLogs)
+{
+    for (const char* uid : {"a", "b"})
+        save(uid, "1");
+    buildAll();
+    correct(edit({"a"}, {{DCM_PatientName, QStringLiteral("Roe^R")}}));
+    correct(move({"a"}, "1", "2", {{DCM_SOPInstanceUID, QStringLiteral("a2")}}));
+    EXPECT_EQ(waiting(), 0);
+    expectSurvival({"1", "2"});
+    EXPECT_EQ(value("2", "a2", DCM_PatientName), "Roe^R");
+    correct(move({"a2"}, "2", "1", {{DCM_SOPInstanceUID, QStringLiteral("a")}}));
+    expectSurvival({"1", "2"});
+    EXPECT_EQ(imagesIn("1"), (Uids{"a", "b"}));
+}
+
+// ---- overlays
+
+ImageOverlay anOverlay()
+{
+    const std::unique_ptr<TagMap> image(anImage("1").with(DCM_PatientName, "Doe^J").map());
+    AuditLog log;
+    log.append({QStringLiteral("now"),
+                {{DCM_PatientName, QStringLiteral("Roe^R"), QStringLiteral("Doe^J")},
+                 {DCM_ImageComments, QStringLiteral("x"), QString()}}});
+    EXPECT_TRUE(log.store(*image));
+    ImageOverlay overlay;
+    overlay.noteLogged(*image);
+    return overlay;
+}
+
+TEST(ImageOverlay, IsReadBackAndDamageIsRefused)
+{
+    const QByteArray bytes = anOverlay().encode();
+    ImageOverlay overlay;
+    ASSERT_TRUE(overlay.decode(bytes));
+    for (int length = 0; length < bytes.size(); ++length)
+        EXPECT_FALSE(overlay.decode(bytes.left(length))) << length;
+    EXPECT_FALSE(overlay.decode(bytes + '\0'));
+    EXPECT_FALSE(overlay.decode('\2' + bytes.mid(1)));
+    for (int i = 0; i < bytes.size(); ++i) {
+        QByteArray damaged = bytes;
+        damaged[i] = static_cast<char>(~damaged.at(i));
+        ImageOverlay other;
+        other.decode(damaged);
+    }
+    EXPECT_EQ(overlay.encode(), bytes);
+}
+
+TEST(ImageOverlay, ReplacesRemovesAndLeavesTheBlocksOfOthersAlone)
+{
+    const std::unique_ptr<TagMap> image(anImage("1").with(DCM_ImageComments, "x").map());
+    image->putAndInsertValue(DcmTagKey(0x0071, 0x0021), "Other", VrCode::LO, "theirs");
+    anOverlay().applyTo(*image);
+    QByteArray text;
+    EXPECT_TRUE(image->findAndGetString(DCM_PatientName, text) && text == "Doe^J");
+    EXPECT_EQ(image->findElement(DCM_ImageComments), nullptr);
+    EXPECT_TRUE(image->findAndGetString({0x0071, 0x0021}, "Other", text) && text == "theirs");
+    AuditLog log;
+    EXPECT_TRUE(log.read(*image) && log.text() == anOverlay().log().text());
+}
+
+}  // namespace
+}  // namespace Kdd
