@@ -196,15 +196,21 @@ void TagFileGenerator::addFile(TagFile& tagFile, const std::string& path, const 
             image = load(path, sources);
         if (image != nullptr && !sources.corrections.applyTo(*image, name))
             image.reset();
+        if (image != nullptr && !sources.isListed(*image, name)) {
+            LogFile::errorf("%s is not the image any more that was registered; it has to be taken in again",
+                            path.c_str());
+            image.reset();
+        }
     }
     if (image == nullptr) {
-        image = sources.formerImages.copy(path);
+        image = isUndecided ? sources.formerImages.copy(path) : sources.copyFormer(path);
         if (!isUndecided)
             ++(image != nullptr ? mNumKept : mNumMissing);
         if (image == nullptr)
             return;
         sources.kept.insert(name);
-        sources.corrections.applyToFormer(*image);
+        if (isUndecided)
+            sources.corrections.applyToFormer(*image);
     }
     addImage(tagFile, std::move(image), path, studyInstanceUID);
 }
