@@ -264,11 +264,10 @@ void TagFileGenerator::addPreviews(TagFile& tagFile, const QList<QByteArray>& ch
         const QByteArray path = filePathOf(*image);
         if (sources.kept.contains(path) && image->findElement(kPreview) != nullptr)
             continue;
-        DcmFileFormat reloaded;
-        DcmDataset* dataset = sources.datasets.find(path);
-        if (dataset == nullptr && loadDicomFile(path.constData(), reloaded).good())
-            dataset = reloaded.getDataset();
-        tagFile.addPreview(image, dataset, pathText(path));
+        if (DcmDataset* dataset = sources.datasets.find(path))
+            tagFile.addPreview(image, dataset, pathText(path));
+        else
+            tagFile.addPreview(image, path);
     }
 }
 

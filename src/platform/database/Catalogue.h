@@ -136,6 +136,7 @@ struct ListedImage
 /// All that the catalogue has of one study.
 struct StudyContents
 {
+    int id = 0;                       ///< 0: there is no such study
     std::vector<ListedImage> images;  ///< by path
     QVector<QByteArray> volumes;  ///< volume files, by path, those that a correction brought along included
     bool isCorrected = false;     ///< a correction concerns an image that is or was in the study

@@ -206,6 +206,7 @@ Kdd::Result SqlCatalogue::studyContents(const QByteArray& studyUID, StudyContent
     return transact(Access::Read, [&] {
         contents = {};
         const qint64 studyId = findStudyId(mConnection, studyUID);
+        contents.id = static_cast<int>(studyId);
         contents.images = listImages(mConnection, studyId);
         for (const ListedVolume& volume : listVolumes(mConnection, studyId)) {
             if (contents.volumes.isEmpty() || contents.volumes.last() != volume.path)

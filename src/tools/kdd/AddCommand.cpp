@@ -50,14 +50,16 @@ void report(const GlobalOptions& options, const FileScan& scan, const StudyIntak
     refused.insert(refused.end(), intake.refused().begin(), intake.refused().end());
     const int failed = static_cast<int>(refused.size());
     if (options.json) {
-        printJson({{QStringLiteral("studies"), studies.size()},
-                   {QStringLiteral("series"), all.series},
-                   {QStringLiteral("images"), all.images},
-                   {QStringLiteral("volumes"), all.volumes},
-                   {QStringLiteral("unchanged"), scan.unchanged()},
-                   {QStringLiteral("skipped"), scan.skipped()},
-                   {QStringLiteral("failed"), failed},
-                   {QStringLiteral("failures"), jsonOf(refused)}});
+        QJsonObject result{{QStringLiteral("studies"), studies.size()},
+                           {QStringLiteral("series"), all.series},
+                           {QStringLiteral("images"), all.images},
+                           {QStringLiteral("volumes"), all.volumes},
+                           {QStringLiteral("unchanged"), scan.unchanged()},
+                           {QStringLiteral("skipped"), scan.skipped()},
+                           {QStringLiteral("failed"), failed}};
+        if (failed > 0)
+            result.insert(QStringLiteral("failures"), jsonOf(refused));
+        printJson(result);
     } else if (!options.quiet) {
         printTotals(studies);
         std::printf(

@@ -29,13 +29,15 @@ Outcome runIndex(const GlobalOptions& options, const ScanRequest& request)
     const int studies = registration.studies().size();
     const int failed = static_cast<int>(scan.refused().size());
     if (options.json) {
-        printJson({{QStringLiteral("studies"), studies},
-                   {QStringLiteral("images"), registration.images()},
-                   {QStringLiteral("volumes"), registration.volumes()},
-                   {QStringLiteral("unchanged"), scan.unchanged()},
-                   {QStringLiteral("skipped"), scan.skipped()},
-                   {QStringLiteral("failed"), failed},
-                   {QStringLiteral("failures"), jsonOf(scan.refused())}});
+        QJsonObject result{{QStringLiteral("studies"), studies},
+                           {QStringLiteral("images"), registration.images()},
+                           {QStringLiteral("volumes"), registration.volumes()},
+                           {QStringLiteral("unchanged"), scan.unchanged()},
+                           {QStringLiteral("skipped"), scan.skipped()},
+                           {QStringLiteral("failed"), failed}};
+        if (failed > 0)
+            result.insert(QStringLiteral("failures"), jsonOf(scan.refused()));
+        printJson(result);
     } else if (!options.quiet) {
         std::printf(
             "%d images and %d volumes registered in %d studies; %d files unchanged, %d skipped, %d failed\n",

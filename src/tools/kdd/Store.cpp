@@ -84,8 +84,8 @@ bool readTagFile(const QString& path, TagFile& file)
 
 QList<QByteArray> ownPlaces(const GlobalOptions& options)
 {
-    QList<QByteArray> places = {absolutePath(TagFile::metaFolder()),
-                                absolutePath(pathBytes(options.volumeFolder()))};
+    QList<QByteArray> places = {absolutePath(TagFile::metaFolder()) + '/',
+                                absolutePath(pathBytes(options.volumeFolder())) + '/'};
     const QByteArray address = Kxg::DatabaseServer();
     if (address.startsWith("sqlite:")) {
         const QByteArray database = absolutePath(address.mid(7));

@@ -2,6 +2,7 @@
 #include "kddlib/Limits.h"
 #include "kddlib/tagmodel/TagSequence.h"
 #include "kddlib/volumes/Volume.h"
+#include "kddlib/volumes/VolumeInfo.h"
 #include "platform/base/KxMsg.h"
 
 using namespace Kdd;
@@ -226,16 +227,17 @@ void nest(TagFile& file, int depth)
                                     outermost->findElement(DCM_RequestAttributesSequence)->clone());
 }
 
-void nameVolumes(TagFile& file, int images)
+/// As many volumes as an image can name, each of all images.
+void addVolumes(TagFile& file, int images)
 {
+    constexpr int kVolumes = 256;
     TagMap& series = *file.findSeries("1.2.3");
     for (int i = series.children().size(); i < images; ++i)
         file.addTagMap(anImage(QByteArray::number(1000 + i).constData()).map(), nullptr, false);
-    QByteArray all;
-    for (int i = 0; i < 256; ++i)
-        all.append(static_cast<char>(i));
-    series.putAndInsertValue(DcmTagKey(0x0006, 0x7103), VrCode::OB, all);
-    series.addBareVolume(new Volume);
+    VolumeInfo info;
+    for (const QByteArray& uid : file.imagesByUID().keys())
+        info.imageUIDs.push_back(uid.toStdString());
+    file.addVolumeInfo(std::vector<VolumeInfo*>(kVolumes, &info));
 }
 
 const Unreadable kUnreadable[] = {
@@ -254,8 +256,8 @@ const Unreadable kUnreadable[] = {
          file.findImage("1")->putAndInsertValue(DCM_PixelData, VrCode::OB, half);
          file.findImage("2")->putAndInsertValue(DCM_PixelData, VrCode::OB, half);
      }},
-    {"Tag file would hold volumes of more images than the format allows",
-     [](TagFile& file) { nameVolumes(file, kMaxVolumeImages / 256 + 1); }},
+    {"the images of series 1.2.3 cannot tell its 256 volumes apart",
+     [](TagFile& file) { addVolumes(file, kMaxVolumeImages / 256 + 1); }},
     {"Tag file would hold image 1 twice",
      [](TagFile& file) { file.findImage("2")->putAndInsertString(DCM_SOPInstanceUID, "1"); }},
     {"Tag file would hold image without UID twice",

@@ -161,4 +161,36 @@ int verifyDataset(DcmItem& dataset, const TagMap& image, const Report& report)
     return verifier.faults();
 }
 
+int verifyCorrected(const TagMap& expected, const TagMap& image, const Report& report)
+{
+    int faults = 0;
+    const auto tell = [&](const DcmTagKey& key, const char* fault) {
+        ++faults;
+        report(keyText(key), fault);
+    };
+    const auto onlyHeld = [&](const DcmTagKey& key) {
+        // What building adds are a place in a picture and the block that it stands in.
+        if (isKept(key) && !isOurOwn(image, key))
+            tell(key, "is neither in the DICOM file nor in a correction");
+    };
+    const TagMap::iterator end = image.end();
+    TagMap::iterator held = image.begin();
+    for (TagMap::iterator it = expected.begin(); it != expected.end(); ++it) {
+        if (!isKept(it.key()))
+            continue;
+        for (; held != end && held.key() < it.key(); ++held)
+            onlyHeld(held.key());
+        if (held == end || held.key() != it.key()) {
+            tell(it.key(), "is not in the tag file");
+            continue;
+        }
+        if (!it.value()->compare(*held.value(), true, nullptr))
+            tell(it.key(), "is not what the DICOM file and its corrections say");
+        ++held;
+    }
+    for (; held != end; ++held)
+        onlyHeld(held.key());
+    return faults;
+}
+
 }  // namespace Kdd

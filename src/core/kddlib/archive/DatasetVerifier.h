@@ -17,4 +17,9 @@ class TagMap;
 int verifyDataset(DcmItem& dataset, const TagMap& image,
                   const std::function<void(const QByteArray& path, const QByteArray& fault)>& report);
 
+/// Holds an image against what it is expected to show, a map that was made from its file and corrected: attributes, VRs
+/// and value bytes, the audit log included. Each difference is told to `report`; the number found is returned.
+int verifyCorrected(const TagMap& expected, const TagMap& image,
+                    const std::function<void(const QByteArray& path, const QByteArray& fault)>& report);
+
 }  // namespace Kdd

@@ -93,7 +93,7 @@ bool FileScan::findChanged(const QList<QByteArray>& paths, QList<QByteArray>& ch
 bool FileScan::isOwn(const QByteArray& file) const
 {
     return std::any_of(mOwnPlaces.begin(), mOwnPlaces.end(), [&](const QByteArray& place) {
-        return file == place || (file.startsWith(place) && file.at(place.size()) == '/');
+        return place.endsWith('/') ? file.startsWith(place) : file == place;
     });
 }
 

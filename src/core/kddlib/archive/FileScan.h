@@ -24,7 +24,7 @@ public:
     {
     }
 
-    /// Folders and files that the archive keeps itself, absolute.
+    /// What the archive keeps itself, absolute: files, and folders, whose names end in "/".
     void setOwnPlaces(const QList<QByteArray>& places) { mOwnPlaces = places; }
 
     /// Of damaged files what is sound is taken, with a warning that tells what is left out; else they are refused.

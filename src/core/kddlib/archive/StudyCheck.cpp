@@ -1,5 +1,6 @@
 #include "kddlib/archive/StudyCheck.h"
 
+#include "kddlib/Limits.h"
 #include "kddlib/archive/ArchiveDatabase.h"
 #include "kddlib/archive/DatasetVerifier.h"
 #include "kddlib/archive/FileWalk.h"
@@ -17,6 +18,7 @@
 
 #include <dcmtk/dcmdata/dcfilefo.h>
 
+#include <memory>
 #include <utility>
 
 namespace Kdd
@@ -114,6 +116,10 @@ void StudyCheck::check(const QByteArray& studyUID)
 {
     TagFile file;
     if (!succeeded(mCatalogue.studyContents(studyUID, mContents))) {
+        ++mFindings.unreadable;
+        return;
+    }
+    if (mContents.isCorrected && !succeeded(mCorrections.read(mContents.id))) {
         ++mFindings.unreadable;
         return;
     }
@@ -223,10 +229,18 @@ void StudyCheck::checkImage(const QByteArray& key, const TagMap& image)
         return;
     }
     ++mFindings.images;
-    mFindings.differences +=
-        verifyDataset(*dicom.getDataset(), image, [&](const QByteArray& attribute, const QByteArray& what) {
-            mReport(QStringLiteral("Image %1: %2 %3").arg(textOf(key), textOf(attribute), textOf(what)));
-        });
+    const auto report = [&](const QByteArray& attribute, const QByteArray& what) {
+        mReport(QStringLiteral("Image %1: %2 %3").arg(textOf(key), textOf(attribute), textOf(what)));
+    };
+    std::unique_ptr<TagMap> expected;
+    if (mContents.isCorrected)
+        expected.reset(TagMap::createTagMap(dicom.getDataset(), kDefaultValueBound));
+    if (expected == nullptr || mCorrections.find(identityOf(*expected, path)) == nullptr)
+        mFindings.differences += verifyDataset(*dicom.getDataset(), image, report);
+    else if (mCorrections.applyTo(*expected, path))
+        mFindings.differences += verifyCorrected(*expected, image, report);
+    else
+        ++mFindings.unreadable;
 }
 
 /// A tag file that the catalogue does not know of, or one that lies under another study's name.

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "kddlib/tagfile/BuildCorrections.h"
 #include "platform/base/Export.h"
 #include "platform/database/Catalogue.h"
 
@@ -56,6 +57,7 @@ private:
     const std::function<void(const QString&)> mReport;
     CheckFindings mFindings;
     Kxg::StudyContents mContents;
+    BuildCorrections mCorrections;
 };
 
 }  // namespace Kdd

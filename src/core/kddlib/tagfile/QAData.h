@@ -42,7 +42,7 @@ struct KDD_EXPORT QAData
         int changed = 0;             ///< images with a new entry in their audit log
         int moved = 0;               ///< images that are now in another study, series or under another UID
         QList<QByteArray> notFound;  ///< images that no study concerned holds
-        bool isLockedOut = false;    ///< it failed because others held a tag file all the time: try again
+        bool isLockedOut = false;    ///< it failed because others held a study all the time: try again
     };
 
     Outcome outcome;

@@ -229,6 +229,9 @@ QARecord::Answer QARecord::record(QString& reason)
             reason = QStringLiteral("Image %1: study %2 is to be built first, for its tag file does not "
                                     "show an earlier correction yet")
                          .arg(QString::fromLatin1(change.key), QString::fromLatin1(change.studyUID));
+            // It came into being after this job had asked for it: now it can be claimed as well.
+            if (mStudies.find(change.studyUID) == mStudies.end())
+                return Answer::Later;
             mCatalogue->requestBuild({change.studyUID}, Kxg::Catalogue::IfGone::PassOver);
             return Answer::Refused;
         }

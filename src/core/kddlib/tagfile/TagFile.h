@@ -247,8 +247,11 @@ public:
     /// belongs, with its preview and its part of the volumes. Images that are not found are counted only, and a job
     /// all of whose values are there already changes nothing.
     ///
-    /// False, with the reason in `message`, when a file could not be held, read or written, or when a value cannot be
-    /// replaced without losing something. Then both files are as they were, but for one case that the message tells: a
+    /// When an image database is set and knows one of the studies, these are claimed, and the correction is recorded
+    /// there before the files are written, so that every later build makes it again.
+    ///
+    /// False, with the reason in `message`, when a study could not be claimed, a file could not be held, read or written,
+    /// the database could not be reached, or when a value cannot be replaced without losing something. Then both files are as they were, but for one case that the message tells: a
     /// move whose images stand in both studies. As after the death of the process in the middle, running the job again
     /// completes it. A job whose old study is its study becomes an edit.
     static bool applyQA(QAData& job, QString& message);

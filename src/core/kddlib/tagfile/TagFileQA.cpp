@@ -90,6 +90,7 @@ bool TagFile::QAJob::run()
 bool TagFile::QAJob::prepare()
 {
     mJob.outcome = {};
+    mMessage.clear();
     if (mJob.oldStudyUID == mJob.studyUID)
         mJob.oldStudyUID.clear();
     mIsMove = !mJob.oldStudyUID.isEmpty();
