@@ -186,6 +186,7 @@ bool ArchiveModel::build(const std::string& study)
         mWaiting.erase(study);
         mUnsettled.erase(study);
     }
+    mSynced.erase(study);
     return isWhole;
 }
 
@@ -281,6 +282,7 @@ bool ArchiveModel::sync(const std::string& study)
             content[image.first] = {listed->second.path, image.second.shows};
     }
     put(study, content);
+    mSynced.insert(study);
     if (!wasTrusted)
         mWaiting.insert(study);
     return true;
@@ -344,7 +346,8 @@ bool ArchiveModel::isFaulty() const
 
 bool ArchiveModel::isSettled(const std::string& study) const
 {
-    return listed().count(study) > 0 && !isFaulty(study) && mUnsettled.count(study) == 0;
+    return listed().count(study) > 0 && !isFaulty(study) && mUnsettled.count(study) == 0 &&
+           mSynced.count(study) == 0;
 }
 
 }  // namespace Kdd

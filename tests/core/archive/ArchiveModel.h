@@ -112,6 +112,7 @@ private:
     std::set<std::string> mSpoiled;               // not what was written last
     std::set<std::string> mWaiting;
     std::set<std::string> mUnsettled;
+    std::set<std::string> mSynced;  // which puts marks of the database into the tag file
 };
 
 }  // namespace Kdd
