@@ -281,6 +281,8 @@ bool ArchiveModel::sync(const std::string& study)
         if (listed != wanted.end())
             content[image.first] = {listed->second.path, image.second.shows};
     }
+    if (content.empty())
+        return false;
     put(study, content);
     mSynced.insert(study);
     if (!wasTrusted)
