@@ -1,6 +1,8 @@
 #include "CommandLineFixture.h"
 
+#include <iterator>
 #include <random>
+#include <set>
 
 using namespace Kdd;
 
@@ -42,7 +44,7 @@ protected:
 
     QByteArray anyImage()
     {
-        return (mExpected.cbegin() + static_cast<int>(mRandom() % unsigned(mExpected.size()))).operator*();
+        return *std::next(mExpected.begin(), static_cast<int>(mRandom() % mExpected.size()));
     }
 
     static QByteArray deletionOf(const QByteArray& image)
@@ -70,7 +72,7 @@ protected:
         EXPECT_EQ(built.exitCode, 0) << after << built.err.toStdString();
         const Answer verified = kdd("verify --all --json");
         EXPECT_EQ(verified.exitCode, 0) << after << verified.err.toStdString();
-        QSet<QByteArray> found;
+        std::set<QByteArray> found;
         for (const char* study : {"1.1", "1.2", "1.3"}) {
             const QByteArray metadata = kdd("metadata", QStringList{QLatin1String(study)}).out;
             for (const QByteArray& image : allImages()) {
@@ -90,7 +92,7 @@ protected:
     }
 
     std::mt19937 mRandom{11};
-    QSet<QByteArray> mExpected;
+    std::set<QByteArray> mExpected;
 };
 
 TEST_F(Operations, ThatWereKilledAreCompletedByTheirRepeat)
@@ -98,7 +100,7 @@ TEST_F(Operations, ThatWereKilledAreCompletedByTheirRepeat)
     std::string story;
     for (int round = 1; round <= 8; ++round) {
         QByteArray command;
-        switch (mExpected.isEmpty() ? 0 : mRandom() % 5) {
+        switch (mExpected.empty() ? 0 : mRandom() % 5) {
         case 0:
         case 1:
             command = "add";
@@ -114,7 +116,7 @@ TEST_F(Operations, ThatWereKilledAreCompletedByTheirRepeat)
             break;
         default:
             const QByteArray image = anyImage();
-            mExpected.remove(image);
+            mExpected.erase(image);
             command = deletionOf(image);
         }
         story += command.toStdString() + '\n';
@@ -145,8 +147,9 @@ TEST_P(PairOfOperations, AtTheSameTimeLoseNothing)
     saveImages(4);
     EXPECT_EQ(finish(*begin("add")).exitCode, 0);
     saveImages(5);
-    if (qstrcmp(GetParam().first, "add") != 0)
+    if (qstrcmp(GetParam().first, "add") != 0) {
         EXPECT_EQ(finish(*begin("add")).exitCode, 0);
+    }
     put("../job.xml", "<Job><Timestamp>20240131120000</Timestamp><Login>anna</Login><Substitutions><Tag "
                       "Group='0010' Element='0010'><Value>Roe^R</Value></Tag></Substitutions></Job>");
     const QByteArray job = mFolder.filePath(QStringLiteral("job.xml")).toUtf8();
@@ -158,11 +161,12 @@ TEST_P(PairOfOperations, AtTheSameTimeLoseNothing)
         EXPECT_TRUE(answer.exitCode == 0 || answer.err.contains("has no image")) << answer.err.toStdString();
     for (const QByteArray& image : allImages()) {
         if (GetParam().removed != nullptr && image.startsWith(GetParam().removed))
-            mExpected.remove(image);
+            mExpected.erase(image);
     }
     expectHealed(GetParam().name);
-    if (QByteArray(GetParam().second).startsWith("qa"))
+    if (QByteArray(GetParam().second).startsWith("qa")) {
         EXPECT_TRUE(kdd("metadata 1.1 --image 7.1.2").out.contains("Roe^R"));
+    }
 }
 
 constexpr const char* kEdit = "qa JOB --study 1.1 --image 7.1.2";
