@@ -5,6 +5,8 @@
 #include "platform/base/LogFile.h"
 #include "platform/database/DirectoryEntry.h"
 #include "platform/database/Kxg.h"
+#include "platform/os/FileStatus.h"
+#include "platform/os/PathName.h"
 
 #include <algorithm>
 
@@ -113,7 +115,11 @@ bool StudySources::readFormer()
     bool isRead = false;
     for (int i = 0; i < kReadingAttempts && !isRead && (i == 0 || former.wasLockedOut()); ++i)
         isRead = former.readCacheFileForStudy(studyUID.constData(), false);
-    if (!isRead && former.wasLockedOut()) {
+    // An empty one counts as just being made; whoever made it is dead, for a build has the study to itself.
+    FileStatus status;
+    const QString path = TagFile::cacheFilePathForStudy(studyUID.constData());
+    const bool isEmpty = statusOf(pathBytes(path).constData(), status) && status.size == 0;
+    if (!isRead && former.wasLockedOut() && !isEmpty) {
         LogFile::errorf("The tag file of study %s cannot be read: others hold it", studyUID.constData());
         return false;
     }

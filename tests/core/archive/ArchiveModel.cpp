@@ -118,10 +118,25 @@ bool ArchiveModel::isTrusted(const std::string& study) const
     return mTagFiles.count(study) > 0 && mSpoiled.count(study) == 0;
 }
 
+/// As corrections make it, whatever file the image comes from.
+ModelFile ArchiveModel::edited(const std::string& key, ModelFile file) const
+{
+    const auto edit = mEdits.find({file.study, key});
+    if (edit != mEdits.end())
+        file.patient = edit->second;
+    return file;
+}
+
+bool ArchiveModel::isCorrected(const std::string& study) const
+{
+    return std::any_of(mEdits.begin(), mEdits.end(),
+                       [&](const auto& edit) { return edit.first.first == study; });
+}
+
 /// All that the study shows, once the arrivals are in, comes from the file that counts.
 bool ArchiveModel::canMerge(const std::string& study, const ModelStudy& arrivals) const
 {
-    if (!isTrusted(study))
+    if (!isTrusted(study) || isCorrected(study))
         return false;
     const ModelStudy wanted = listedImages(study);
     const ModelStudy& present = mTagFiles.at(study);
@@ -166,13 +181,13 @@ bool ArchiveModel::build(const std::string& study)
         const bool isThat = file != mDisk.end() && file->second.study == known.study &&
                             file->second.series == known.series && file->second.sop == known.sop;
         if (isThat) {
-            content[image.first] = {path, file->second};
+            content[image.first] = {path, edited(image.first, file->second)};
             continue;
         }
         isWhole = false;
         const ModelStudy* former = tagFile(study);
         if (former != nullptr && former->count(image.first) > 0)
-            content[image.first] = {path, former->at(image.first).shows};
+            content[image.first] = {path, edited(image.first, former->at(image.first).shows)};
     }
     if (wanted.empty()) {
         forgetTagFile(study);
@@ -186,7 +201,7 @@ bool ArchiveModel::build(const std::string& study)
         mWaiting.erase(study);
         mUnsettled.erase(study);
     }
-    mSynced.erase(study);
+    mMarked.erase(study);
     return isWhole;
 }
 
@@ -254,7 +269,7 @@ bool ArchiveModel::remove(const std::string& study, const std::string& series, c
     }
     const bool isAlone = !isWaiting(study);
     const ModelStudy left = listedImages(study);
-    bool holdsAll = isAlone && isTrusted(study) && !left.empty();
+    bool holdsAll = isAlone && isTrusted(study) && !isCorrected(study) && !left.empty();
     for (const auto& each : left)
         holdsAll =
             holdsAll && present->count(each.first) > 0 && present->at(each.first).path == each.second.path;
@@ -284,10 +299,24 @@ bool ArchiveModel::sync(const std::string& study)
     if (content.empty())
         return false;
     put(study, content);
-    mSynced.insert(study);
+    mMarked.insert(study);
     if (!wasTrusted)
         mWaiting.insert(study);
     return true;
+}
+
+int ArchiveModel::edit(const std::string& study, const std::string& image, const std::string& patient)
+{
+    ModelStudy& present = mTagFiles.at(study);
+    const auto found = present.find(image);
+    if (found == present.end())
+        return 0;
+    if (found->second.shows.patient != patient) {
+        found->second.shows.patient = patient;
+        mEdits[{study, image}] = patient;
+        mMarked.insert(study);
+    }
+    return 1;
 }
 
 // ---- what is to be seen
@@ -335,7 +364,7 @@ bool ArchiveModel::isFaulty(const std::string& study) const
         const auto file = mDisk.find(image.second.path);
         const auto known = wanted.find(image.first);
         return known == wanted.end() || known->second.path != image.second.path || file == mDisk.end() ||
-               !(file->second == image.second.shows);
+               !(edited(image.first, file->second) == image.second.shows);
     });
 }
 
@@ -349,7 +378,7 @@ bool ArchiveModel::isFaulty() const
 bool ArchiveModel::isSettled(const std::string& study) const
 {
     return listed().count(study) > 0 && !isFaulty(study) && mUnsettled.count(study) == 0 &&
-           mSynced.count(study) == 0;
+           mMarked.count(study) == 0;
 }
 
 }  // namespace Kdd

@@ -64,6 +64,9 @@ public:
     bool remove(const std::string& study, const std::string& series, const std::string& image);
     bool sync(const std::string& study);
 
+    /// Of a patient's name; how many images were found.
+    int edit(const std::string& study, const std::string& image, const std::string& patient);
+
     // ---- what is to be seen
 
     std::set<std::string> listed() const;
@@ -72,6 +75,7 @@ public:
 
     /// Null when no file that can be read is to be there.
     const ModelStudy* tagFile(const std::string& study) const;
+    bool isTrusted(const std::string& study) const;
     bool hasTagFile(const std::string& study) const { return mIsThere.count(study) > 0; }
 
     /// Whether a check has something to tell.
@@ -94,7 +98,8 @@ private:
     static std::string keyOf(const std::string& path, const ModelFile& file);
     std::vector<std::string> changedBelow(const std::string& folder) const;
     std::set<std::string> registerAll(const std::vector<std::string>& paths);
-    bool isTrusted(const std::string& study) const;
+    ModelFile edited(const std::string& key, ModelFile file) const;
+    bool isCorrected(const std::string& study) const;
     bool canMerge(const std::string& study, const ModelStudy& arrivals) const;
     void complete(const std::string& study, const ModelStudy& arrivals, bool isAlone, bool& isDone);
     bool build(const std::string& study);
@@ -112,7 +117,8 @@ private:
     std::set<std::string> mSpoiled;               // not what was written last
     std::set<std::string> mWaiting;
     std::set<std::string> mUnsettled;
-    std::set<std::string> mSynced;  // which puts marks of the database into the tag file
+    std::set<std::string> mMarked;  // by a sync or a correction, which change the tag file as it is
+    std::map<std::pair<std::string, std::string>, std::string> mEdits;  // of studies and images
 };
 
 }  // namespace Kdd
