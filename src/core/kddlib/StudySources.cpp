@@ -3,7 +3,10 @@
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
+#include "platform/database/DirectoryEntry.h"
 #include "platform/database/Kxg.h"
+#include "platform/os/FileStatus.h"
+#include "platform/os/PathName.h"
 
 #include <algorithm>
 
@@ -42,7 +45,8 @@ std::unique_ptr<TagMap> ImagesByPath::copy(const std::string& path) const
 {
     const TagMap* image = mImages.value(QByteArray::fromStdString(path), nullptr);
     std::unique_ptr<TagMap> copy(image != nullptr ? image->clone() : nullptr);
-    for (const DcmTagKey& key : {kFilePath, kVolumeIndex, kFromDatabase, kHasVolumeFile, kAbstract}) {
+    for (const DcmTagKey& key :
+         {kFilePath, kFileSuffix, kVolumeIndex, kFromDatabase, kHasVolumeFile, kAbstract}) {
         if (copy != nullptr)
             copy->deleteElement(key);
     }
@@ -56,9 +60,52 @@ bool StudySources::query(const QByteArray& user, int studyId)
         LogFile::errorf("Database query GetAllFilesOfStudy() failed.");
     else
         result = corrections.read(studyId);
+    if (result.good())
+        result = queryImages();
     if (result.bad())
         LogFile::errorf("%s", qUtf8Printable(result.text()));
     return result.good();
+}
+
+Result StudySources::queryImages()
+{
+    QMap<QByteArray, std::shared_ptr<Kxg::SeriesInfo>> series;
+    Result result = Kxg::GetSeries(corrections.studyUID(), series);
+    mListed.clear();
+    for (const std::shared_ptr<Kxg::SeriesInfo>& info : qAsConst(series)) {
+        for (const Kxg::ImageFile& file : info->images)
+            mListed.insert(file.path, {info->seriesInstanceUID,
+                                       file.sopInstanceUID.isEmpty() ? file.path : file.sopInstanceUID});
+    }
+    return result;
+}
+
+bool StudySources::isListed(const TagMap& image, const QByteArray& path) const
+{
+    const auto listed = mListed.constFind(path);
+    if (listed == mListed.cend())
+        return true;
+    const QByteArray sopUID = image.uid(TagMap::ImageLevel);
+    return image.uid(TagMap::StudyLevel) == corrections.studyUID() &&
+           image.uid(TagMap::SeriesLevel) == listed->seriesUID &&
+           (sopUID.isEmpty() ? path : sopUID) == listed->key;
+}
+
+std::unique_ptr<TagMap> StudySources::copyFormer(const std::string& path) const
+{
+    const QByteArray name = QByteArray::fromStdString(path);
+    const auto listed = mListed.constFind(name);
+    // It may have come from another file of the same image so far.
+    const TagMap* sameImage = listed != mListed.cend() ? former.findImage(listed->key) : nullptr;
+    std::unique_ptr<TagMap> image =
+        formerImages.copy(sameImage != nullptr ? filePathOf(*sameImage).toStdString() : path);
+    if (image == nullptr)
+        return nullptr;
+    corrections.applyToFormer(*image);
+    const QByteArray sopUID = image->uid(TagMap::ImageLevel);
+    if (listed != mListed.cend() && (sopUID.isEmpty() ? name : sopUID) != listed->key)
+        return nullptr;
+    return image;
 }
 
 /// A study that has no tag file yet, or a damaged one, has nothing to keep.
@@ -68,7 +115,11 @@ bool StudySources::readFormer()
     bool isRead = false;
     for (int i = 0; i < kReadingAttempts && !isRead && (i == 0 || former.wasLockedOut()); ++i)
         isRead = former.readCacheFileForStudy(studyUID.constData(), false);
-    if (!isRead && former.wasLockedOut()) {
+    // An empty one counts as just being made; whoever made it is dead, for a build has the study to itself.
+    FileStatus status;
+    const QString path = TagFile::cacheFilePathForStudy(studyUID.constData());
+    const bool isEmpty = statusOf(pathBytes(path).constData(), status) && status.size == 0;
+    if (!isRead && former.wasLockedOut() && !isEmpty) {
         LogFile::errorf("The tag file of study %s cannot be read: others hold it", studyUID.constData());
         return false;
     }

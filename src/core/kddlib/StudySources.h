@@ -3,6 +3,7 @@
 #include "kddlib/tagfile/AdoptedCorrections.h"
 #include "kddlib/tagfile/BuildCorrections.h"
 #include "kddlib/tagfile/TagFile.h"
+#include "platform/base/Result.h"
 
 #include <QHash>
 #include <QSet>
@@ -61,6 +62,14 @@ struct StudySources
     /// first, so that building has one source for all. False, with the reason logged, when something cannot be had.
     bool collect(const QByteArray& user, int studyId);
 
+    /// Whether an image, as corrections make it, is the one that the database lists for the file. A file may have been
+    /// given other content since it was registered.
+    bool isListed(const TagMap& image, const QByteArray& path) const;
+
+    /// What the present tag file has of the image listed for the file, as corrections make it; null when it has nothing
+    /// of that.
+    std::unique_ptr<TagMap> copyFormer(const std::string& path) const;
+
     std::vector<std::string> dicomFiles;
     std::vector<std::string> volumeFiles;
     std::vector<std::string> seriesWithVolumeFile;
@@ -73,8 +82,17 @@ struct StudySources
     KeptDatasets datasets;
 
 private:
+    struct Listed
+    {
+        QByteArray seriesUID;
+        QByteArray key;
+    };
+
     bool query(const QByteArray& user, int studyId);
+    Result queryImages();
     bool readFormer();
+
+    QHash<QByteArray, Listed> mListed;  // by path
 };
 
 }  // namespace Kdd

@@ -38,6 +38,8 @@ const char* const kSeriesInstanceUID = "G0020-000E";
 const char* const kModality = "G0008-0060";
 const char* const kMammography = "MG";
 
+constexpr char kForeign[] = "File %s does not belong to study %s";
+
 const char* userOrDefault(const char* user)
 {
     return user != nullptr ? user : kDefaultUser;
@@ -196,15 +198,23 @@ void TagFileGenerator::addFile(TagFile& tagFile, const std::string& path, const 
             image = load(path, sources);
         if (image != nullptr && !sources.corrections.applyTo(*image, name))
             image.reset();
+        if (image != nullptr && !sources.isListed(*image, name)) {
+            if (image->uid(TagMap::StudyLevel) != sources.corrections.studyUID())
+                LogFile::warnf(kForeign, path.c_str(), sources.corrections.studyUID().constData());
+            else
+                LogFile::errorf("%s is not the image that was registered any more", path.c_str());
+            image.reset();
+        }
     }
     if (image == nullptr) {
-        image = sources.formerImages.copy(path);
+        image = isUndecided ? sources.formerImages.copy(path) : sources.copyFormer(path);
         if (!isUndecided)
             ++(image != nullptr ? mNumKept : mNumMissing);
         if (image == nullptr)
             return;
         sources.kept.insert(name);
-        sources.corrections.applyToFormer(*image);
+        if (isUndecided)
+            sources.corrections.applyToFormer(*image);
     }
     addImage(tagFile, std::move(image), path, studyInstanceUID);
 }
@@ -234,7 +244,7 @@ bool TagFileGenerator::addImage(TagFile& tagFile, std::unique_ptr<TagMap> image,
     const int before = tagFile.imagesByUID().size();
     TagMap* placed = isForeign ? nullptr : tagFile.addTagMap(image.release(), path.c_str(), true);
     if (placed == nullptr) {
-        LogFile::warnf("File %s does not belong to study %s", path.c_str(),
+        LogFile::warnf(kForeign, path.c_str(),
                        studyInstanceUID != nullptr ? studyInstanceUID
                                                    : tagFile.studyInstanceUID().constData());
         return false;

@@ -141,6 +141,7 @@ struct StudyContents
     QVector<QByteArray> volumes;  ///< volume files, by path, those that a correction brought along included
     bool isCorrected = false;     ///< a correction concerns an image that is or was in the study
     bool isWaiting = false;       ///< something changed since its tag file was built
+    QVector<qint64> changes;      ///< the requests left by what changed; what only has to settle leaves none
     TagFileStamp tagFile;
 };
 

@@ -222,6 +222,10 @@ Kdd::Result SqlCatalogue::studyContents(const QByteArray& studyUID, StudyContent
             contents.tagFile = {rows.number(0), rows.bytes(1)};
             contents.isWaiting = rows.truth(2);
         }
+        SqlRows changes = mConnection.ask(
+            "SELECT id FROM build_request WHERE study_id = ? AND due = 0 ORDER BY id", {studyId});
+        while (changes.next())
+            contents.changes.push_back(changes.number(0));
     });
 }
 

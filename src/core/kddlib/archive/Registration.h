@@ -28,6 +28,9 @@ public:
     /// The studies that registered files belong to or were taken from.
     const QSet<QByteArray>& studies() const { return mStudies; }
 
+    /// The requests that registering left for a study.
+    QVector<qint64> requests(const QByteArray& studyUID) const { return mRequests.value(studyUID); }
+
     int images() const { return mImages; }
     int volumes() const { return mVolumes; }
 
@@ -35,6 +38,7 @@ private:
     Kxg::Catalogue& mCatalogue;
     Kxg::FileRecords mBatch;
     QSet<QByteArray> mStudies;
+    QHash<QByteArray, QVector<qint64>> mRequests;
     int mImages = 0;
     int mVolumes = 0;
 };

@@ -107,7 +107,10 @@ bool StudyChange::removeRegistered(const ArchiveNode& node)
     if (!isWholeStudy && !isListed(node, contents) &&
         !(present.readWhenFreeForStudy(node.study.constData(), false) && isHeld(node, present)))
         return failAbsent(node);
-    return forget(node) && StudyCompletion(mCatalogue).reduce(*claim).isDone;
+    if (!forget(node))
+        return false;
+    StudyCompletion completion(mCatalogue);
+    return (contents.changes.isEmpty() ? completion.reduce(*claim) : completion.build(*claim)).isDone;
 }
 
 bool StudyChange::forget(const ArchiveNode& node)
@@ -130,7 +133,14 @@ bool StudyChange::correct(QAData& job, QString& message)
 bool StudyChange::synchronise(const QByteArray& studyUID, TagFile& file)
 {
     const std::unique_ptr<Kxg::StudyClaim> claim = claimStudy(mCatalogue, studyUID);
-    if (claim == nullptr || !file.readAndSync(studyUID.constData(), nullptr))
+    Kxg::StudyContents contents;
+    if (claim == nullptr || !succeeded(mCatalogue.studyContents(studyUID, contents)))
+        return false;
+    const bool isStale = !isTagFile(TagFile::cacheFilePathForStudy(studyUID.constData()), contents.tagFile);
+    if (!file.readAndSync(studyUID.constData(), nullptr))
+        return false;
+    // What it shows may be older than what is registered, and would be taken for the newest once it is written.
+    if (isStale && !succeeded(mCatalogue.requestBuild({studyUID})))
         return false;
     file.optimizeAll();
     if (!file.writeCacheFile())
@@ -138,6 +148,9 @@ bool StudyChange::synchronise(const QByteArray& studyUID, TagFile& file)
     Kxg::BuiltStudy built = builtStudy(file);
     // Files that wait to be built in are not opened here.
     built.isComplete = false;
+    if (isStale)
+        LogFile::warnf("The tag file of study %s was not the one written last; the study waits to be built",
+                       studyUID.constData());
     return succeeded(claim->finish(built));
 }
 

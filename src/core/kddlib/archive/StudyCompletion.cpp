@@ -50,14 +50,15 @@ Kxg::BuiltStudy unsettled(const TagFile& file)
 
 }  // namespace
 
-CompletedStudy StudyCompletion::complete(Kxg::StudyClaim& claim, TagFile& arrivals)
+CompletedStudy StudyCompletion::complete(Kxg::StudyClaim& claim, TagFile& arrivals,
+                                         const QVector<qint64>& requests)
 {
     if (!readContents(claim))
         return {};
     if (mContents.images.empty())
         return remove(claim);
     TagFile present;
-    if (canMerge(claim.studyInstanceUID(), arrivals, present))
+    if (canMerge(claim.studyInstanceUID(), arrivals, requests, present))
         return merge(claim, arrivals, present);
     return build(claim, arrivals);
 }
@@ -70,8 +71,9 @@ CompletedStudy StudyCompletion::reduce(Kxg::StudyClaim& claim)
         return remove(claim);
     TagFile present;
     const QByteArray& studyUID = claim.studyInstanceUID();
-    if (!isTrusted(studyUID) || !present.readWhenFreeForStudy(studyUID.constData(), true) ||
-        !holdsListed(TagFile(), present)) {
+    // The removal itself has left one request.
+    if (mContents.changes.size() > 1 || !isTrusted(studyUID) ||
+        !present.readWhenFreeForStudy(studyUID.constData(), true) || !holdsListed(TagFile(), present)) {
         present.close();
         return build(claim, TagFile());
     }
@@ -143,9 +145,13 @@ bool StudyCompletion::isTrusted(const QByteArray& studyUID) const
            isTagFile(TagFile::cacheFilePathForStudy(studyUID.constData()), mContents.tagFile);
 }
 
-bool StudyCompletion::canMerge(const QByteArray& studyUID, const TagFile& arrivals, TagFile& present) const
+bool StudyCompletion::canMerge(const QByteArray& studyUID, const TagFile& arrivals,
+                               const QVector<qint64>& requests, TagFile& present) const
 {
-    return arrivals.studyInstanceUID() == studyUID && isTrusted(studyUID) &&
+    // A file of the same path and image may have been registered with other content.
+    const bool isAlone = std::all_of(mContents.changes.begin(), mContents.changes.end(),
+                                     [&](qint64 request) { return requests.contains(request); });
+    return isAlone && arrivals.studyInstanceUID() == studyUID && isTrusted(studyUID) &&
            present.readWhenFreeForStudy(studyUID.constData(), false) && holdsListed(arrivals, present) &&
            std::all_of(arrivals.imagesByUID().keyBegin(), arrivals.imagesByUID().keyEnd(),
                        [&](const QByteArray& key) { return mListed.contains(key); }) &&

@@ -24,7 +24,7 @@ struct CompletedStudy
 ///
 /// - a study without images loses its tag file;
 /// - images that have just arrived are merged into a tag file that holds all the others and is the one that was written
-///   last; it is then built once more when nothing has arrived for a time (`ExResource::settleSeconds`), because the
+///   last, unless something else changed that is not in it yet; it is then built once more when nothing has arrived for a time (`ExResource::settleSeconds`), because the
 ///   order of arrival shows in the order of the file;
 /// - from such a tag file images that were removed are taken out, likewise;
 /// - else the tag file is built from all files of the study.
@@ -42,11 +42,11 @@ public:
     }
 
     /// With images that were loaded already, each with its path in (0006,7100); of another study or not listed they are
-    /// ignored. What `arrivals` holds afterwards is not settled.
-    CompletedStudy complete(Kxg::StudyClaim& claim, TagFile& arrivals);
+    /// ignored. `requests` are those that registering them left. What `arrivals` holds afterwards is not settled.
+    CompletedStudy complete(Kxg::StudyClaim& claim, TagFile& arrivals, const QVector<qint64>& requests);
 
-    /// After a removal: takes out what is not listed any more, without opening a file where the tag file can be
-    /// trusted.
+    /// After a removal from a study of which nothing else had changed: takes out what is not listed any more, without
+    /// opening a file where the tag file can be trusted.
     CompletedStudy reduce(Kxg::StudyClaim& claim);
 
     /// From all files of the study.
@@ -56,7 +56,8 @@ private:
     bool readContents(Kxg::StudyClaim& claim);
     static CompletedStudy remove(Kxg::StudyClaim& claim);
     CompletedStudy build(Kxg::StudyClaim& claim, const TagFile& loaded) const;
-    bool canMerge(const QByteArray& studyUID, const TagFile& arrivals, TagFile& present) const;
+    bool canMerge(const QByteArray& studyUID, const TagFile& arrivals, const QVector<qint64>& requests,
+                  TagFile& present) const;
     bool isTrusted(const QByteArray& studyUID) const;
     bool holdsListed(const TagFile& arrivals, const TagFile& present) const;
     std::vector<QByteArray> unlisted(const TagFile& present) const;

@@ -102,8 +102,9 @@ bool StudyIntake::complete(const QByteArray& studyUID, PendingStudy* arrivals)
     CompletedStudy completed;
     if (claim != nullptr) {
         StudyCompletion completion(mCatalogue);
-        completed =
-            arrivals != nullptr ? completion.complete(*claim, arrivals->file) : completion.build(*claim);
+        completed = arrivals != nullptr
+                        ? completion.complete(*claim, arrivals->file, mRegistration.requests(studyUID))
+                        : completion.build(*claim);
     }
     if (!completed.isDone) {
         mRefused.push_back({studyUID, QStringLiteral("Its tag file is not completed; it waits to be built")});

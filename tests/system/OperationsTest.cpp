@@ -1,0 +1,194 @@
+#include "CommandLineFixture.h"
+
+#include <iterator>
+#include <random>
+#include <set>
+
+using namespace Kdd;
+
+namespace
+{
+
+/// Commands that meet: killed and repeated, or at the same time. Whatever happened, one build heals the archive.
+class Operations : public CommandLine
+{
+protected:
+    static DatasetBuilder slice(const char* uid, const char* study, int number)
+    {
+        const QByteArray text = QByteArray::number(number);
+        DatasetBuilder image = anImage(uid).inStudy(study).inSeries((QByteArray(study) + ".1").constData());
+        image.with(DCM_PatientName, "Doe^J").with(DCM_InstanceNumber, text.constData());
+        image.with(DCM_ImagePositionPatient, ("0\\0\\" + text).constData()).with(DCM_PixelSpacing, "1\\1");
+        image.with(DCM_ImageOrientationPatient, "1\\0\\0\\0\\1\\0").with(DCM_FrameOfReferenceUID, study);
+        image.with(DCM_Columns, "4").with(DCM_Rows, "3").with(DCM_PhotometricInterpretation, "MONOCHROME2");
+        image.with(DCM_SamplesPerPixel, "1").with(DCM_BitsAllocated, "16").with(DCM_BitsStored, "16");
+        image.with(DCM_HighBit, "15").with(DCM_PixelRepresentation, "0");
+        const Uint16 pixels[12] = {0, 1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11};
+        image.dataset().putAndInsertUint16Array(DCM_PixelData, pixels, 12);
+        return image;
+    }
+
+    /// Images 7.N.1 to 7.N.8 of studies 1.1 to 1.3, of which those with a number below `count` are there so far.
+    void saveImages(int count)
+    {
+        for (int study = 1; study <= 3; ++study) {
+            for (int i = 1; i <= count; ++i) {
+                const QByteArray uid = "7." + QByteArray::number(study) + '.' + QByteArray::number(i);
+                const QByteArray studyUID = "1." + QByteArray::number(study);
+                if (!QFile::exists(file(uid.constData())))
+                    save(uid.constData(), slice(uid.constData(), studyUID.constData(), i));
+                mExpected.insert(uid);
+            }
+        }
+    }
+
+    QByteArray anyImage()
+    {
+        return *std::next(mExpected.begin(), static_cast<int>(mRandom() % mExpected.size()));
+    }
+
+    static QByteArray deletionOf(const QByteArray& image)
+    {
+        return "delete 1." + image.mid(2, 1) + " --image " + image;
+    }
+
+    std::unique_ptr<Process> begin(const QByteArray& command) const
+    {
+        return start(command.constData(), command == "add" ? QStringList{images()} : QStringList());
+    }
+
+    void kill(const QByteArray& command)
+    {
+        const auto process = begin(command);
+        process->waitForFinished(static_cast<int>(mRandom() % 80));
+        process->kill();
+        process->waitForFinished(kTimeout);
+    }
+
+    /// A build, a check, and a look at what is there.
+    void expectHealed(const std::string& after)
+    {
+        const Answer built = kdd("build --all");
+        EXPECT_EQ(built.exitCode, 0) << after << built.err.toStdString();
+        const Answer verified = kdd("verify --all --json");
+        EXPECT_EQ(verified.exitCode, 0) << after << verified.err.toStdString();
+        std::set<QByteArray> found;
+        for (const char* study : {"1.1", "1.2", "1.3"}) {
+            const QByteArray metadata = kdd("metadata", QStringList{QLatin1String(study)}).out;
+            for (const QByteArray& image : allImages()) {
+                if (metadata.contains('"' + image + '"'))
+                    found.insert(image);
+            }
+        }
+        EXPECT_EQ(found, mExpected) << after;
+    }
+
+    QList<QByteArray> allImages() const
+    {
+        QList<QByteArray> all;
+        for (const QString& name : QDir(images()).entryList(QDir::Files))
+            all.append(name.toUtf8());
+        return all;
+    }
+
+    std::mt19937 mRandom{11};
+    std::set<QByteArray> mExpected;
+};
+
+TEST_F(Operations, ThatWereKilledAreCompletedByTheirRepeat)
+{
+    std::string story;
+    for (int round = 1; round <= 8; ++round) {
+        QByteArray command;
+        switch (mExpected.empty() ? 0 : mRandom() % 5) {
+        case 0:
+        case 1:
+            command = "add";
+            saveImages(round);
+            for (const QByteArray& image : allImages())
+                mExpected.insert(image);  // what was deleted comes back with its file
+            break;
+        case 2:
+            command = "build --all --again";
+            break;
+        case 3:
+            command = "stack --again";
+            break;
+        default:
+            const QByteArray image = anyImage();
+            mExpected.erase(image);
+            command = deletionOf(image);
+        }
+        story += command.toStdString() + '\n';
+        kill(command);
+        const Answer repeated = finish(*begin(command));
+        // A deletion that came to its end leaves nothing to delete.
+        EXPECT_TRUE(repeated.exitCode == 0 || repeated.err.contains("has no image"))
+            << story << repeated.err.toStdString();
+        if (round % 2 == 0)
+            expectHealed(story);
+    }
+}
+
+struct Pair
+{
+    const char* name;
+    const char* first;
+    const char* second;
+    const char* removed;  // what is to be gone in the end
+};
+
+class PairOfOperations : public Operations, public testing::WithParamInterface<Pair>
+{
+};
+
+TEST_P(PairOfOperations, AtTheSameTimeLoseNothing)
+{
+    saveImages(4);
+    EXPECT_EQ(finish(*begin("add")).exitCode, 0);
+    saveImages(5);
+    if (qstrcmp(GetParam().first, "add") != 0) {
+        EXPECT_EQ(finish(*begin("add")).exitCode, 0);
+    }
+    put("../job.xml", "<Job><Timestamp>20240131120000</Timestamp><Login>anna</Login><Substitutions><Tag "
+                      "Group='0010' Element='0010'><Value>Roe^R</Value></Tag></Substitutions></Job>");
+    const QByteArray job = mFolder.filePath(QStringLiteral("job.xml")).toUtf8();
+    const auto first = begin(QByteArray(GetParam().first).replace("JOB", job));
+    const auto second = begin(QByteArray(GetParam().second).replace("JOB", job));
+    const Answer answers[] = {finish(*first), finish(*second)};
+    // Of two deletions the later one finds nothing.
+    for (const Answer& answer : answers)
+        EXPECT_TRUE(answer.exitCode == 0 || answer.err.contains("has no image")) << answer.err.toStdString();
+    for (const QByteArray& image : allImages()) {
+        if (GetParam().removed != nullptr && image.startsWith(GetParam().removed))
+            mExpected.erase(image);
+    }
+    expectHealed(GetParam().name);
+    if (QByteArray(GetParam().second).startsWith("qa")) {
+        EXPECT_TRUE(kdd("metadata 1.1 --image 7.1.2").out.contains("Roe^R"));
+    }
+}
+
+constexpr const char* kEdit = "qa JOB --study 1.1 --image 7.1.2";
+
+const Pair kPairs[] = {
+    {"AddAndAdd", "add", "add", nullptr},
+    {"AddAndBuild", "add", "build --all --again", nullptr},
+    {"AddAndSync", "add", "sync 1.1", nullptr},
+    {"AddAndStack", "add", "stack", nullptr},
+    {"AddAndEdit", "add", kEdit, nullptr},
+    {"BuildAndBuild", "build --all --again", "build --all --again", nullptr},
+    {"BuildAndDeleteStudy", "build --all --again", "delete 1.1", "7.1."},
+    {"BuildAndDeleteImage", "build --all --again", "delete 1.2 --image 7.2.3", "7.2.3"},
+    {"BuildAndEdit", "build --all --again", kEdit, nullptr},
+    {"StackAndDeleteImage", "stack", "delete 1.2 --image 7.2.3", "7.2.3"},
+    {"StackAndBuild", "stack", "build --all --again", nullptr},
+    {"StackAndEdit", "stack", kEdit, nullptr},
+    {"DeleteAndDelete", "delete 1.2 --image 7.2.3", "delete 1.2 --image 7.2.3", "7.2.3"},
+    {"DeleteAndEdit", "delete 1.1 --image 7.1.3", kEdit, "7.1.3"},
+};
+
+INSTANTIATE_TEST_SUITE_P(Meeting, PairOfOperations, testing::ValuesIn(kPairs),
+                         [](const auto& pair) { return std::string(pair.param.name); });
+
+}  // namespace
