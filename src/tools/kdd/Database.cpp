@@ -28,8 +28,11 @@ bool chooseStudies(Kxg::Catalogue& database, const QList<QByteArray>& named, boo
         std::vector<Kxg::StudySummary> studies;
         if (!succeeded(database.listStudies(studies)))
             return false;
-        for (const Kxg::StudySummary& study : studies)
-            studyUIDs.append(study.studyInstanceUID);
+        // Where only volume files are left, because corrections moved the images away, there is nothing to work on.
+        for (const Kxg::StudySummary& study : studies) {
+            if (study.images > 0)
+                studyUIDs.append(study.studyInstanceUID);
+        }
         return true;
     }
     bool allFound = true;

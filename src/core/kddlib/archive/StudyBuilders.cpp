@@ -114,7 +114,7 @@ bool requestStale(Kxg::Catalogue& catalogue, bool everything)
     QVector<QByteArray> stale;
     for (const Kxg::StudySummary& study : studies) {
         const QString path = TagFile::cacheFilePathForStudy(study.studyInstanceUID.constData());
-        if (!study.isWaiting && (everything || !isTagFile(path, study.tagFile)))
+        if (!study.isWaiting && study.images > 0 && (everything || !isTagFile(path, study.tagFile)))
             stale.append(study.studyInstanceUID);
     }
     // Others may remove studies meanwhile.

@@ -93,6 +93,9 @@ void StudyCheck::checkAll()
     for (const Kxg::StudySummary& study : studies) {
         if (mObserver.isCancelled())
             return;
+        // Where only volume files are left there is no tag file.
+        if (study.images == 0)
+            continue;
         check(study.studyInstanceUID);
         known.insert(TagFile::cacheFilePathForStudy(study.studyInstanceUID.constData()));
     }
