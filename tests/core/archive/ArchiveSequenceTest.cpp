@@ -116,7 +116,7 @@ protected:
         else if (what < 89)
             sync(pickStudy());
         else if (what < 92)
-            edit(pickStudy());
+            edit(pickStudy(), "9." + std::to_string(pick(10)), "Roe^" + std::to_string(pick(3)));
         else
             spoil(pickStudy());
     }
@@ -247,10 +247,8 @@ protected:
     }
 
     /// Of a tag file that shows what the catalogue believes; else corrections may be refused.
-    void edit(const std::string& study)
+    void edit(const std::string& study, const std::string& image, const std::string& patient)
     {
-        const std::string image = "9." + std::to_string(pick(10));
-        const std::string patient = "Roe^" + std::to_string(pick(3));
         if (!mModel.isTrusted(study) || mModel.listedImages(study).count(image) == 0)
             return;
         tell("qa study " + study + " image " + image + ": patient " + patient);
@@ -530,6 +528,18 @@ TEST_F(FixedSequence, DeletingBuildsInWhatWasOnlyIndexed)
     remove("1.1", "", "9.2");
     expectAgreement();
     EXPECT_FALSE(mModel.isFaulty());
+}
+
+TEST_F(FixedSequence, AnEditLeavesAnImageInTheSeriesOfItsFile)
+{
+    at("1", {"1.1", "1.1.7", "9.1", "Doe^1", "1"});
+    index(root());
+    edit("1.1", "9.1", "Roe^R");
+    expectAgreement();
+    expectHealed();
+    at("1", {"1.1", "1.1.8", "9.1", "Doe^1", "1"});
+    add(root());
+    expectHealed();
 }
 
 TEST_F(FixedSequence, ASyncedOldTagFileWaitsToBeBuilt)
