@@ -316,7 +316,7 @@ TEST_F(TagFileFormat, WhatItsReaderJustTakesIsWritten)
     add(file, anImage("1"));
     add(file, anImage("2"));
     nest(file, kMaxItemDepth);
-    nameVolumes(file, kMaxVolumeImages / 256);
+    addVolumes(file, kMaxVolumeImages / 256);
     TagFile again;
     ASSERT_TRUE(read(again, written(file)));
     EXPECT_EQ(treeText(again), treeText(file));
