@@ -57,6 +57,14 @@ protected:
         return start(command.constData(), command == "add" ? QStringList{images()} : QStringList());
     }
 
+    QByteArray saveJob(const QByteArray& patient) const
+    {
+        put("../job.xml", "<Job><Timestamp>20240131120000</Timestamp><Login>anna</Login><Substitutions><Tag "
+                          "Group='0010' Element='0010'><Value>" +
+                              patient + "</Value></Tag></Substitutions></Job>");
+        return mFolder.filePath(QStringLiteral("job.xml")).toUtf8();
+    }
+
     void kill(const QByteArray& command)
     {
         const auto process = begin(command);
@@ -98,13 +106,17 @@ protected:
 TEST_F(Operations, ThatWereKilledAreCompletedByTheirRepeat)
 {
     std::string story;
-    for (int round = 1; round <= 8; ++round) {
+    const QByteArray rounds = qgetenv("KDD_KILL_ROUNDS");
+    const int count = rounds.isEmpty() ? 8 : rounds.toInt();
+    if (qEnvironmentVariableIsSet("KDD_ARCHIVE_SEED"))
+        mRandom.seed(static_cast<unsigned>(qEnvironmentVariableIntValue("KDD_ARCHIVE_SEED")));
+    for (int round = 1; round <= count; ++round) {
         QByteArray command;
-        switch (mExpected.empty() ? 0 : mRandom() % 5) {
+        switch (mExpected.empty() ? 0 : mRandom() % 6) {
         case 0:
         case 1:
             command = "add";
-            saveImages(round);
+            saveImages(qMin(round, 8));
             for (const QByteArray& image : allImages())
                 mExpected.insert(image);  // what was deleted comes back with its file
             break;
@@ -114,6 +126,12 @@ TEST_F(Operations, ThatWereKilledAreCompletedByTheirRepeat)
         case 3:
             command = "stack --again";
             break;
+        case 4: {
+            const QByteArray image = anyImage();
+            command = "qa " + saveJob("Roe^" + QByteArray::number(round)) + " --study 1." + image.mid(2, 1) +
+                      " --image " + image;
+            break;
+        }
         default:
             const QByteArray image = anyImage();
             mExpected.erase(image);
@@ -150,9 +168,7 @@ TEST_P(PairOfOperations, AtTheSameTimeLoseNothing)
     if (qstrcmp(GetParam().first, "add") != 0) {
         EXPECT_EQ(finish(*begin("add")).exitCode, 0);
     }
-    put("../job.xml", "<Job><Timestamp>20240131120000</Timestamp><Login>anna</Login><Substitutions><Tag "
-                      "Group='0010' Element='0010'><Value>Roe^R</Value></Tag></Substitutions></Job>");
-    const QByteArray job = mFolder.filePath(QStringLiteral("job.xml")).toUtf8();
+    const QByteArray job = saveJob("Roe^R");
     const auto first = begin(QByteArray(GetParam().first).replace("JOB", job));
     const auto second = begin(QByteArray(GetParam().second).replace("JOB", job));
     const Answer answers[] = {finish(*first), finish(*second)};

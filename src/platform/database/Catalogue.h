@@ -117,9 +117,9 @@ struct ImageCorrection
     QByteArray studyInstanceUID;  ///< as the DICOM file has it
     QByteArray image;             ///< its SOP Instance UID likewise, or the file's path where it has none
 
-    QByteArray shownStudyUID;  ///< where the image stands now
-    QByteArray shownSeriesUID;
-    QByteArray shownImage;  ///< its SOP Instance UID now, or the path
+    QByteArray shownStudyUID;   ///< where the image stands now
+    QByteArray shownSeriesUID;  ///< empty: the one that the file says
+    QByteArray shownImage;      ///< its SOP Instance UID now, or the path
 
     /// The attributes that are replaced, as whoever corrects encodes them. Empty: there is no correction any more.
     QByteArray changes;

@@ -65,6 +65,12 @@ std::vector<FileRow> filesOf(SqlConnection& connection, qint64 studyId, const QB
     return files;
 }
 
+QByteArray seriesUIDOf(SqlConnection& connection, qint64 seriesId)
+{
+    SqlRows rows = connection.ask("SELECT uid FROM series WHERE id = ?", {seriesId});
+    return rows.next() ? rows.text(0) : QByteArray();
+}
+
 /// The volume files that hold a series' images hold them still when they stand in another series.
 void shareVolumes(SqlConnection& connection, qint64 fromSeries, qint64 toSeries)
 {
@@ -128,7 +134,10 @@ void recordCorrection(SqlConnection& connection, const ImageCorrection& correcti
     const std::vector<FileRow> files = filesOf(connection, oldStudy, before.image);
     if (files.empty())
         return;
-    const qint64 newSeries = obtainSeries(connection, newStudy, correction.shownSeriesUID);
+    const qint64 newSeries =
+        obtainSeries(connection, newStudy,
+                     correction.shownSeriesUID.isEmpty() ? seriesUIDOf(connection, files.back().seriesId)
+                                                         : correction.shownSeriesUID);
     // What has no UID is known by its path, which no correction changes, until one gives it a UID.
     const QByteArray sopUID =
         correction.shownImage == files.back().path ? QByteArray("") : correction.shownImage;

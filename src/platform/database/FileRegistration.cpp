@@ -107,7 +107,8 @@ void FileRegistration::followCorrections(std::vector<Entry>& entries)
             mOutcome->conflicts.push_back({FileConflict::Kind::FollowsCorrection, entry.path, entry.sopUID,
                                            entry.studyUID, QByteArray(), found->shownStudyUID});
         entry.studyUID = found->shownStudyUID;
-        entry.seriesUID = found->shownSeriesUID;
+        if (!found->shownSeriesUID.isEmpty())
+            entry.seriesUID = found->shownSeriesUID;
         if (found->shownImage != entry.path)
             entry.sopUID = found->shownImage;
     }

@@ -81,8 +81,8 @@ void AdoptedCorrections::look(const TagMap& image)
         overlay.decode(known->changes);
     }
     overlay.noteLogged(image);
-    mFound.push_back({identity.studyUID, identity.image, mKnown.studyUID(), image.uid(TagMap::SeriesLevel),
-                      key, overlay.encode()});
+    mFound.push_back({identity.studyUID, identity.image, mKnown.studyUID(), overlay.seriesOf(image), key,
+                      overlay.encode()});
 }
 
 /// Which image a corrected one was. False when its log came with the file.

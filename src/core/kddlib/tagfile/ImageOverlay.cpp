@@ -109,6 +109,12 @@ bool ImageOverlay::isEmpty() const
     return mElements->tagsForLevel().isEmpty();
 }
 
+QByteArray ImageOverlay::seriesOf(const TagMap& image) const
+{
+    return mElements->findElement(DCM_SeriesInstanceUID) != nullptr ? image.uid(TagMap::SeriesLevel)
+                                                                    : QByteArray();
+}
+
 QByteArray ImageOverlay::encode() const
 {
     KxMsg out;

@@ -43,6 +43,10 @@ public:
 
     bool isEmpty() const;
 
+    /// The series that a corrected image was given; empty when no correction replaced it, so that the image stands where
+    /// its file says, also a file that comes later.
+    QByteArray seriesOf(const TagMap& image) const;
+
     /// A number of the form (1), then the record of a tag map: bytes that are compared only by `decode`.
     QByteArray encode() const;
 

@@ -260,9 +260,12 @@ Result QARecord::add(const QAImageChange& change, const Kxg::ImageCorrection& fo
             overlay.note(*image, each.key);
     }
     overlay.noteLogged(*image);
+    const QByteArray seriesUID = overlay.seriesOf(*image);
     mFormer.push_back(former);
-    mRecorded.push_back({former.studyInstanceUID, former.image, change.holder->studyInstanceUID(),
-                         image->uid(TagMap::SeriesLevel), change.keyNow, overlay.encode()});
+    if (seriesUID.isEmpty() && former.shownStudyUID == change.holder->studyInstanceUID())
+        mFormer.back().shownSeriesUID.clear();
+    mRecorded.push_back({former.studyInstanceUID, former.image, change.holder->studyInstanceUID(), seriesUID,
+                         change.keyNow, overlay.encode()});
     return {};
 }
 
