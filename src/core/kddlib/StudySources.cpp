@@ -80,15 +80,14 @@ Result StudySources::queryImages()
     return result;
 }
 
+/// A file that was registered without SOP Instance UID is taken for what it is: nothing was said of it.
 bool StudySources::isListed(const TagMap& image, const QByteArray& path) const
 {
     const auto listed = mListed.constFind(path);
-    if (listed == mListed.cend())
+    if (listed == mListed.cend() || listed->key == path)
         return true;
-    const QByteArray sopUID = image.uid(TagMap::ImageLevel);
-    return image.uid(TagMap::StudyLevel) == corrections.studyUID() &&
-           image.uid(TagMap::SeriesLevel) == listed->seriesUID &&
-           (sopUID.isEmpty() ? path : sopUID) == listed->key;
+    return image.uid(TagMap::ImageLevel) == listed->key &&
+           (listed->seriesUID.isEmpty() || image.uid(TagMap::SeriesLevel) == listed->seriesUID);
 }
 
 std::unique_ptr<TagMap> StudySources::copyFormer(const std::string& path) const

@@ -198,9 +198,11 @@ void TagFileGenerator::addFile(TagFile& tagFile, const std::string& path, const 
             image = load(path, sources);
         if (image != nullptr && !sources.corrections.applyTo(*image, name))
             image.reset();
-        if (image != nullptr && !sources.isListed(*image, name)) {
-            if (image->uid(TagMap::StudyLevel) != sources.corrections.studyUID())
-                LogFile::warnf(kForeign, path.c_str(), sources.corrections.studyUID().constData());
+        const bool isForeign = image != nullptr && studyInstanceUID != nullptr &&
+                               image->uid(TagMap::StudyLevel) != studyInstanceUID;
+        if (image != nullptr && (isForeign || !sources.isListed(*image, name))) {
+            if (isForeign)
+                LogFile::warnf(kForeign, path.c_str(), studyInstanceUID);
             else
                 LogFile::errorf("%s is not the image that was registered any more", path.c_str());
             image.reset();
