@@ -131,6 +131,9 @@ struct ListedImage
     QByteArray path;
     QByteArray seriesInstanceUID;
     QByteArray sopInstanceUID;  ///< as it is shown; empty where the file has none
+
+    /// Under which tag files know it.
+    const QByteArray& key() const { return sopInstanceUID.isEmpty() ? path : sopInstanceUID; }
 };
 
 /// All that the catalogue has of one study.

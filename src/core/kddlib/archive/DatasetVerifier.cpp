@@ -1,6 +1,7 @@
 #include "kddlib/archive/DatasetVerifier.h"
 
 #include "kddlib/Limits.h"
+#include "kddlib/tagfile/QAEditor.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/tagmodel/TagSequence.h"
@@ -17,7 +18,7 @@ using Report = std::function<void(const QByteArray&, const QByteArray&)>;
 
 QByteArray keyText(const DcmTagKey& key)
 {
-    return QString::asprintf("(%04x,%04x)", unsigned(key.getGroup()), unsigned(key.getElement())).toLatin1();
+    return keyName(key).toLatin1();
 }
 
 bool isKept(const DcmTagKey& key)

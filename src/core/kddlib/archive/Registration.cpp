@@ -64,10 +64,8 @@ bool Registration::flush()
     Kxg::RegistrationOutcome outcome;
     if (!succeeded(mCatalogue.registerFiles(mBatch, outcome)))
         return false;
-    for (auto it = outcome.requests.cbegin(); it != outcome.requests.cend(); ++it) {
-        mStudies.insert(it.key());
+    for (auto it = outcome.requests.cbegin(); it != outcome.requests.cend(); ++it)
         mRequests[it.key()].append(it.value());
-    }
     for (const Kxg::FileConflict& conflict : outcome.conflicts)
         warnOf(conflict);
     mImages += static_cast<int>(mBatch.dicom.size());

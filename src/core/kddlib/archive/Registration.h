@@ -26,7 +26,7 @@ public:
     bool flush();
 
     /// The studies that registered files belong to or were taken from.
-    const QSet<QByteArray>& studies() const { return mStudies; }
+    QList<QByteArray> studies() const { return mRequests.keys(); }
 
     /// The requests that registering left for a study.
     QVector<qint64> requests(const QByteArray& studyUID) const { return mRequests.value(studyUID); }
@@ -37,7 +37,6 @@ public:
 private:
     Kxg::Catalogue& mCatalogue;
     Kxg::FileRecords mBatch;
-    QSet<QByteArray> mStudies;
     QHash<QByteArray, QVector<qint64>> mRequests;
     int mImages = 0;
     int mVolumes = 0;

@@ -24,9 +24,8 @@ constexpr int kAttempts = 300;
 bool isListed(const ArchiveNode& node, const Kxg::StudyContents& contents)
 {
     return std::any_of(contents.images.begin(), contents.images.end(), [&](const Kxg::ListedImage& listed) {
-        const QByteArray& key = listed.sopInstanceUID.isEmpty() ? listed.path : listed.sopInstanceUID;
         return (node.series.isEmpty() || listed.seriesInstanceUID == node.series) &&
-               (node.image.isEmpty() || key == node.image);
+               (node.image.isEmpty() || listed.key() == node.image);
     });
 }
 

@@ -163,7 +163,7 @@ void StudyCheck::checkListing(const QByteArray& studyUID, const TagFile& file)
         fault(QStringLiteral("The tag file of study %1 is not the one that was written last").arg(study));
     QSet<QByteArray> listed;
     for (const Kxg::ListedImage& each : mContents.images) {
-        const QByteArray& key = each.sopInstanceUID.isEmpty() ? each.path : each.sopInstanceUID;
+        const QByteArray& key = each.key();
         listed.insert(key);
         const TagMap* image = file.findImage(key);
         if (image == nullptr)

@@ -10,6 +10,7 @@
 #include "platform/resources/ExResource.h"
 
 #include <QDateTime>
+#include <QThread>
 
 #include <algorithm>
 #include <iterator>
@@ -20,24 +21,21 @@ namespace Kdd
 namespace
 {
 
-/// Attempts to merge or remove while others hold the file: each waits two seconds or some tens of milliseconds.
+/// For about two minutes while others hold the file: each attempt to merge waits two seconds, one to remove not at all.
 constexpr int kMergeAttempts = 60;
-constexpr int kRemovalAttempts = 1000;
+constexpr int kRemovalAttempts = 6000;
+constexpr unsigned long kPause = 20;  // [ms]
 
 bool removeStudyFile(const QByteArray& studyUID)
 {
     const QString path = TagFile::cacheFilePathForStudy(studyUID.constData());
     for (int i = 0; i < kRemovalAttempts; ++i) {
-        if (removeTagFile(path))
+        if (removeTagFileOnce(path) == 0)
             return true;
+        QThread::msleep(kPause);
     }
     LogFile::errorf("The tag file of study %s cannot be removed: others hold it", studyUID.constData());
     return false;
-}
-
-const QByteArray& keyOf(const Kxg::ListedImage& listed)
-{
-    return listed.sopInstanceUID.isEmpty() ? listed.path : listed.sopInstanceUID;
 }
 
 /// A study whose tag file shows the order in which it came about.
@@ -107,7 +105,7 @@ bool StudyCompletion::readContents(Kxg::StudyClaim& claim)
         return false;
     mListed.clear();
     for (const Kxg::ListedImage& image : mContents.images)
-        mListed.insert(keyOf(image));
+        mListed.insert(image.key());
     return true;
 }
 
@@ -162,7 +160,7 @@ bool StudyCompletion::canMerge(const QByteArray& studyUID, const TagFile& arriva
 bool StudyCompletion::holdsListed(const TagFile& arrivals, const TagFile& present) const
 {
     return std::all_of(mContents.images.begin(), mContents.images.end(), [&](const Kxg::ListedImage& listed) {
-        const QByteArray& key = keyOf(listed);
+        const QByteArray& key = listed.key();
         const TagMap* image = arrivals.findImage(key);
         if (image == nullptr)
             image = present.findImage(key);

@@ -24,8 +24,8 @@ struct CompletedStudy
 ///
 /// - a study without images loses its tag file;
 /// - images that have just arrived are merged into a tag file that holds all the others and is the one that was written
-///   last, unless something else changed that is not in it yet; it is then built once more when nothing has arrived for a time (`ExResource::settleSeconds`), because the
-///   order of arrival shows in the order of the file;
+///   last, unless something else changed that is not in it yet; it is then built once more when nothing has arrived for
+///   a time (`ExResource::settleSeconds`), because the order of arrival shows in the order of the file;
 /// - from such a tag file images that were removed are taken out, likewise;
 /// - else the tag file is built from all files of the study.
 ///

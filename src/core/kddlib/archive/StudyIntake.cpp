@@ -69,7 +69,7 @@ bool StudyIntake::write(Pending::iterator study)
     if (!mRegistration.flush())
         return false;
     // Corrections may have led all its files elsewhere.
-    if (mRegistration.studies().contains(study->first))
+    if (!mRegistration.requests(study->first).isEmpty())
         complete(study->first, &study->second);
     mPendingImages -= study->second.images;
     mPending.erase(study);

@@ -36,9 +36,8 @@ Kxg::ImageCorrection noCorrection(const ImageIdentity& identity, const QByteArra
 
 bool isHeld(const Kxg::StudyContents& contents, const QByteArray& key)
 {
-    return std::any_of(contents.images.begin(), contents.images.end(), [&](const Kxg::ListedImage& listed) {
-        return key == (listed.sopInstanceUID.isEmpty() ? listed.path : listed.sopInstanceUID);
-    });
+    return std::any_of(contents.images.begin(), contents.images.end(),
+                       [&](const Kxg::ListedImage& listed) { return key == listed.key(); });
 }
 
 }  // namespace
