@@ -151,6 +151,21 @@ protected:
     int mRange = 0;  // their greatest value, if it is told
 };
 
+TEST_F(GeneratorTest, AFileIsTakenForWhatItIsWhereNothingWasSaidOfIt)
+{
+    addFile(aPicture("1", "1"), "1");
+    Kxg::DicomFileRecord record;
+    record.path = path("1");
+    record.studyInstanceUID = "any";
+    registerFiles({{record}, {}, {}});
+    TagFile built;
+    std::vector<Kxg::StudySummary> studies;
+    ASSERT_TRUE(database->listStudies(studies).good());
+    ASSERT_EQ(studies.size(), 1U);
+    EXPECT_TRUE(TagFileGenerator().createTagFile(built, studies.front().id, nullptr));
+    EXPECT_NE(built.findImage("1"), nullptr);
+}
+
 TEST_F(GeneratorTest, ImagesVolumesAndPreviewsBecomeOneFile)
 {
     for (const char* uid : {"1", "2", "3", "4"})
