@@ -3,7 +3,7 @@
 
 #include "bench/Workload.h"
 #include "kddlib/TagFileGenerator.h"
-#include "kddlib/net/DicomFileReader.h"
+#include "kddlib/net/dicom/DicomFileReader.h"
 #include "kddlib/previews/PreviewGenerator.h"
 #include "platform/database/Catalogue.h"
 #include "platform/database/Kxg.h"

@@ -2,7 +2,7 @@
 
 #include "kddlib/Limits.h"
 #include "kddlib/tagmodel/TagMap.h"
-#include "tools/kdd/sample/SampleStudies.h"
+#include "sample/Studies.h"
 
 #include <QFileInfo>
 

@@ -2,7 +2,7 @@
 
 #include "fuzz/Property.h"
 #include "kddlib/Limits.h"
-#include "kddlib/net/DicomFileReader.h"
+#include "kddlib/net/dicom/DicomFileReader.h"
 #include "kddlib/tagfile/TagFile.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "support/TreeText.h"

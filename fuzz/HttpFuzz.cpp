@@ -1,10 +1,10 @@
 // What servers say in their headers, and the names that callers give to objects.
 
 #include "fuzz/Property.h"
-#include "kddlib/net/ByteRange.h"
-#include "kddlib/net/HeaderReceiver.h"
-#include "kddlib/net/RequestAddress.h"
-#include "kddlib/net/StoragePath.h"
+#include "kddlib/net/cloud/StoragePath.h"
+#include "kddlib/net/http/ByteRange.h"
+#include "kddlib/net/http/HeaderReceiver.h"
+#include "kddlib/net/http/RequestAddress.h"
 
 #include <algorithm>
 #include <string>

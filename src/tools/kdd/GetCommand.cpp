@@ -1,5 +1,5 @@
 #include "kddlib/net/KxCurlClient.h"
-#include "kddlib/net/KxCurlDownloadStream.h"
+#include "kddlib/net/http/KxCurlDownloadStream.h"
 #include "platform/base/LogFile.h"
 #include "tools/kdd/Commands.h"
 #include "tools/kdd/PartialFile.h"

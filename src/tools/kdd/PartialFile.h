@@ -1,6 +1,6 @@
 #pragma once
 
-#include "kddlib/net/ObjectVersion.h"
+#include "kddlib/net/http/ObjectVersion.h"
 
 #include <QFile>
 #include <QString>

@@ -1,6 +1,6 @@
 #include "kddlib/net/KxCurlClient.h"
-#include "kddlib/net/KxCurlUploadStream.h"
-#include "kddlib/net/UploadErrors.h"
+#include "kddlib/net/cloud/KxCurlUploadStream.h"
+#include "kddlib/net/cloud/UploadErrors.h"
 #include "platform/base/LogFile.h"
 #include "tools/kdd/Commands.h"
 #include "tools/kdd/Database.h"

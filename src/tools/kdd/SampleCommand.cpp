@@ -1,9 +1,9 @@
+#include "sample/Studies.h"
 #include "tools/kdd/Commands.h"
 #include "tools/kdd/Database.h"
 #include "tools/kdd/Progress.h"
 #include "tools/kdd/Report.h"
 #include "tools/kdd/SampleVolumes.h"
-#include "tools/kdd/sample/SampleStudies.h"
 
 #include <cstdio>
 

@@ -1,7 +1,7 @@
 #include "CatalogueFixture.h"
-#include "kddlib/tagfile/TagFileRemoval.h"
 #include "kddlib/capi/kddtagfile.h"
 #include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagfile/TagFileRemoval.h"
 #include "platform/base/LogFile.h"
 #include "platform/os/ExclusiveFile.h"
 #include "support/LogCapture.h"

@@ -1,6 +1,6 @@
 #include "kddlib/capi/FragmentLocation.h"
 #include "kddlib/capi/kddstream.h"
-#include "kddlib/net/DicomFileReader.h"
+#include "kddlib/net/dicom/DicomFileReader.h"
 #include "platform/volume/FragmentReader.h"
 #include "support/DatasetBuilder.h"
 #include "support/LogCapture.h"

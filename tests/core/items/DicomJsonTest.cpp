@@ -1,7 +1,7 @@
 #include "kddlib/items/DicomJson.h"
 
 #include "kddlib/Limits.h"
-#include "kddlib/net/DicomFileReader.h"
+#include "kddlib/net/dicom/DicomFileReader.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "support/DatasetBuilder.h"

@@ -1,6 +1,6 @@
 #include "kddlib/items/kdditemof.h"
 #include "kddlib/items/kdditemtm.h"
-#include "kddlib/net/DicomFileReader.h"
+#include "kddlib/net/dicom/DicomFileReader.h"
 #include "kddlib/tagfile/TagFile.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"

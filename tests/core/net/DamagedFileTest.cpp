@@ -1,6 +1,6 @@
-#include "kddlib/net/DamagedFile.h"
+#include "kddlib/net/dicom/DamagedFile.h"
 
-#include "kddlib/net/DicomFileReader.h"
+#include "kddlib/net/dicom/DicomFileReader.h"
 #include "support/DatasetBuilder.h"
 
 #include <QFile>

@@ -1,5 +1,5 @@
 #include "kddlib/net/KxCurlClient.h"
-#include "kddlib/net/KxCurlDownloadStream.h"
+#include "kddlib/net/http/KxCurlDownloadStream.h"
 #include "support/HttpServer.h"
 #include "support/ObjectServer.h"
 

@@ -1,4 +1,4 @@
-#include "kddlib/net/KxCurlHandleFactory.h"
+#include "kddlib/net/http/KxCurlHandleFactory.h"
 
 #include <gtest/gtest.h>
 

@@ -1,7 +1,7 @@
-#include "kddlib/net/RequestAddress.h"
+#include "kddlib/net/http/RequestAddress.h"
 
 #include "kddlib/net/KxCurlClient.h"
-#include "kddlib/net/PreparedRequest.h"
+#include "kddlib/net/http/PreparedRequest.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>

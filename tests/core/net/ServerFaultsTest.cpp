@@ -1,5 +1,5 @@
 #include "kddlib/net/KxCurlClient.h"
-#include "kddlib/net/KxHttpStatus.h"
+#include "kddlib/net/http/KxHttpStatus.h"
 #include "support/HttpServer.h"
 #include "support/LogCapture.h"
 

@@ -1,6 +1,6 @@
 #include "kddlib/net/KxCurlClient.h"
-#include "kddlib/net/KxHttpStatus.h"
-#include "kddlib/net/TlsLocks.h"
+#include "kddlib/net/http/KxHttpStatus.h"
+#include "kddlib/net/http/TlsLocks.h"
 #include "support/HttpServer.h"
 #include "support/LogCapture.h"
 

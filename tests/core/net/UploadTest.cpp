@@ -1,7 +1,7 @@
-#include "kddlib/net/Crc32c.h"
-#include "kddlib/net/CurlShare.h"
-#include "kddlib/net/KxCurlUploadStream.h"
-#include "kddlib/net/KxCurlUploadStreambuf.h"
+#include "kddlib/net/cloud/Crc32c.h"
+#include "kddlib/net/cloud/KxCurlUploadStream.h"
+#include "kddlib/net/cloud/KxCurlUploadStreambuf.h"
+#include "kddlib/net/http/CurlShare.h"
 #include "support/CloudStore.h"
 #include "support/LogCapture.h"
 

@@ -1,6 +1,6 @@
 #include "kddlib/previews/QuadrantNavigation.h"
 
-#include "kddlib/net/DicomFileReader.h"
+#include "kddlib/net/dicom/DicomFileReader.h"
 #include "kddlib/previews/PreviewGenerator.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"

@@ -1,7 +1,7 @@
 #include "kddlib/volumes/StackWriter.h"
 
 #include "core/volumes/StackFixture.h"
-#include "kddlib/net/DicomFileReader.h"
+#include "kddlib/net/dicom/DicomFileReader.h"
 #include "kddlib/volumes/VolumeInfo.h"
 #include "platform/volume/PixelTypes.h"
 #include "platform/volume/StoredFrame.h"

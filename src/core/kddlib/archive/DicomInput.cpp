@@ -1,8 +1,8 @@
 #include "kddlib/archive/DicomInput.h"
 
 #include "kddlib/Limits.h"
-#include "kddlib/net/DamagedFile.h"
-#include "kddlib/net/DicomFileReader.h"
+#include "kddlib/net/dicom/DamagedFile.h"
+#include "kddlib/net/dicom/DicomFileReader.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/VolumeInfo.h"
 #include "platform/os/FileStatus.h"

@@ -5,7 +5,7 @@
 #include "kddlib/archive/DatasetVerifier.h"
 #include "kddlib/archive/FileWalk.h"
 #include "kddlib/archive/WorkObserver.h"
-#include "kddlib/net/KxDcmFileLoader.h"
+#include "kddlib/net/dicom/KxDcmFileLoader.h"
 #include "kddlib/tagfile/StudyRecord.h"
 #include "kddlib/tagfile/TagFile.h"
 #include "kddlib/tagmodel/OwnAttributes.h"

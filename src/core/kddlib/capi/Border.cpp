@@ -1,6 +1,6 @@
 #include "kddlib/capi/Border.h"
 
-#include "kddlib/net/CurlError.h"
+#include "kddlib/net/http/CurlError.h"
 #include "platform/base/LogFile.h"
 
 namespace Kdd

@@ -1,7 +1,7 @@
 #include "kddlib/capi/FragmentLocation.h"
 
-#include "kddlib/net/DicomParse.h"
-#include "kddlib/net/LocalFileStream.h"
+#include "kddlib/net/dicom/DicomParse.h"
+#include "kddlib/net/dicom/LocalFileStream.h"
 #include "platform/os/RandomAccessFile.h"
 #include "platform/volume/FragmentReader.h"
 

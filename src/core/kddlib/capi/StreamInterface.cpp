@@ -1,8 +1,8 @@
 #include "kddlib/capi/Border.h"
 #include "kddlib/capi/kddstream.h"
 #include "kddlib/net/KxCurlClient.h"
-#include "kddlib/net/KxCurlDownloadStream.h"
-#include "kddlib/net/KxHttpStatus.h"
+#include "kddlib/net/http/KxCurlDownloadStream.h"
+#include "kddlib/net/http/KxHttpStatus.h"
 #include "platform/base/LogFile.h"
 
 #include <array>

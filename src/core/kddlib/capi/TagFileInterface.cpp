@@ -1,7 +1,7 @@
 #include "kddlib/capi/Border.h"
-#include "kddlib/tagfile/TagFileRemoval.h"
 #include "kddlib/capi/kddtagfile.h"
 #include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagfile/TagFileRemoval.h"
 #include "platform/base/LogFile.h"
 #include "platform/database/Kxg.h"
 #include "platform/os/FileStatus.h"

@@ -1,7 +1,7 @@
 #include "kddlib/capi/Border.h"
 #include "kddlib/capi/FragmentLocation.h"
 #include "kddlib/capi/kddstream.h"
-#include "kddlib/net/KxDcmFileLoader.h"
+#include "kddlib/net/dicom/KxDcmFileLoader.h"
 #include "platform/base/LogFile.h"
 
 #include <QByteArray>

@@ -1,6 +1,6 @@
 #include "kddlib/items/kdditemtm.h"
 
-#include "kddlib/net/KxDcmFileLoader.h"
+#include "kddlib/net/dicom/KxDcmFileLoader.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/tagmodel/TagSequence.h"

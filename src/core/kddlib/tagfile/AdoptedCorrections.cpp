@@ -1,7 +1,7 @@
 #include "kddlib/tagfile/AdoptedCorrections.h"
 
 #include "kddlib/Limits.h"
-#include "kddlib/net/KxDcmFileLoader.h"
+#include "kddlib/net/dicom/KxDcmFileLoader.h"
 #include "kddlib/tagfile/TagFile.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"

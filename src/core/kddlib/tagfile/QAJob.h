@@ -99,7 +99,7 @@ private:
     bool mIsMove = false;
     bool mSourceHasLabels = false;
     bool mDestinationHasLabels = false;  // or a new one is to have them
-    bool mReordersImages = false;  // in volumes
+    bool mReordersImages = false;        // in volumes
     QString mTime;
     QByteArray mBefore;  // the destination's file, of a move
     qint64 mLogBytes = 0;

@@ -2,7 +2,7 @@
 
 #include "kddlib/Limits.h"
 #include "kddlib/items/FileNaming.h"
-#include "kddlib/net/KxDcmFileLoader.h"
+#include "kddlib/net/dicom/KxDcmFileLoader.h"
 #include "kddlib/tagfile/NodeAttributes.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"

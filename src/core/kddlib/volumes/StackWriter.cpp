@@ -1,6 +1,6 @@
 #include "kddlib/volumes/StackWriter.h"
 
-#include "kddlib/net/KxDcmFileLoader.h"
+#include "kddlib/net/dicom/KxDcmFileLoader.h"
 #include "kddlib/volumes/StackParameters.h"
 #include "kddlib/volumes/StackPlanner.h"
 #include "kddlib/volumes/StackValues.h"

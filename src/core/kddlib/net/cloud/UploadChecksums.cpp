@@ -1,0 +1,76 @@
+#include "kddlib/net/cloud/UploadChecksums.h"
+
+#include "kddlib/net/cloud/Crc32c.h"
+#include "kddlib/net/http/KxHttpStatus.h"
+
+#include <QJsonDocument>
+#include <QJsonObject>
+#include <QList>
+#include <QtEndian>
+
+namespace Kdd
+{
+namespace
+{
+
+constexpr int kLongestDescription = 1024 * 1024;  // [bytes]; a longer answer describes no object
+
+// The checksums as the storage names and writes them: base64, the numbers big-endian.
+constexpr char kLength[] = "length";
+constexpr char kCrc32c[] = "crc32c";
+constexpr char kMd5[] = "md5";
+
+}  // namespace
+
+void UploadChecksums::add(const QByteArray& bytes)
+{
+    mLength += static_cast<quint64>(bytes.size());
+    mCrc32c = crc32c(bytes, mCrc32c);
+    mMd5.addData(bytes);
+}
+
+UploadChecksums::Claims UploadChecksums::own() const
+{
+    QByteArray crc(sizeof mCrc32c, '\0');
+    qToBigEndian(mCrc32c, crc.data());
+    return {{kLength, std::to_string(mLength)},
+            {kCrc32c, crc.toBase64().toStdString()},
+            {kMd5, mMd5.result().toBase64().toStdString()}};
+}
+
+UploadChecksums::Claims UploadChecksums::claimsOf(const KxHttpStatus& status, const QByteArray& response)
+{
+    Claims claims;
+    if (response.size() <= kLongestDescription) {
+        const QJsonObject object = QJsonDocument::fromJson(response).object();
+        const std::pair<const char*, const char*> fields[] = {
+            {"size", kLength}, {"crc32c", kCrc32c}, {"md5Hash", kMd5}};
+        for (const auto& [field, name] : fields)
+            claims[name] = object.value(QLatin1String(field)).toString().toStdString();
+    }
+    if (const auto length = status.headers.find("x-goog-stored-content-length");
+        length != status.headers.end())
+        claims[kLength] = length->second;
+    // One line with all checksums, or one line for each, of which the last is known.
+    const auto header = status.headers.find("x-goog-hash");
+    const QByteArray hashes =
+        header == status.headers.end() ? QByteArray() : QByteArray::fromStdString(header->second);
+    for (const QByteArray& hash : hashes.split(',')) {
+        const int end = hash.indexOf('=');
+        claims[hash.left(end).trimmed().toStdString()] = hash.mid(end + 1).trimmed().toStdString();
+    }
+    return claims;
+}
+
+std::string UploadChecksums::difference(const KxHttpStatus& status, const QByteArray& response) const
+{
+    Claims claims = claimsOf(status, response);
+    for (const auto& [name, value] : own()) {
+        const std::string& claim = claims[name];
+        if (!claim.empty() && claim != value)
+            return std::string(name).append(" ").append(claim).append(" instead of ").append(value);
+    }
+    return {};
+}
+
+}  // namespace Kdd

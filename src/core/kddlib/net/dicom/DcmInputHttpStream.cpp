@@ -1,0 +1,26 @@
+#include "kddlib/net/dicom/DcmInputHttpStream.h"
+
+#include "kddlib/net/KxCurlClient.h"
+
+namespace Kdd
+{
+
+void DcmHttpProducer::request(const std::string& url, const std::string& bearerToken)
+{
+    std::vector<std::string> headers;
+    if (!bearerToken.empty())
+        headers.push_back("Authorization: Bearer " + bearerToken);
+    setStream(KxCurlClient::instance().read(url, headers, false));
+}
+
+DcmInputHttpStream::DcmInputHttpStream()
+    : DcmInputStream(&mProducer)
+{
+}
+
+void DcmInputHttpStream::setBearerToken(const char* token)
+{
+    mBearerToken = token ? token : "";
+}
+
+}  // namespace Kdd

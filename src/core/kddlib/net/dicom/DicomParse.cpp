@@ -1,0 +1,21 @@
+#include "kddlib/net/dicom/DicomParse.h"
+
+namespace Kdd
+{
+
+OFCondition parseStream(DcmInputStream& stream, DcmFileFormat& file, const ParseOptions& options)
+{
+    OFCondition condition = stream.status();
+    if (condition.bad())
+        return condition;
+    file.clear();
+    file.setReadMode(options.mode);
+    file.transferInit();
+    condition = options.reader
+                    ? options.reader(stream, options.maxReadLength)
+                    : file.read(stream, options.syntax, options.groupLength, options.maxReadLength);
+    file.transferEnd();
+    return condition;
+}
+
+}  // namespace Kdd

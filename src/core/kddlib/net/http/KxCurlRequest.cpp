@@ -1,0 +1,82 @@
+#include "kddlib/net/http/KxCurlRequest.h"
+
+#include "kddlib/Limits.h"
+#include "platform/base/BuildInfo.h"
+
+#include <utility>
+
+namespace Kdd
+{
+namespace
+{
+
+std::string userAgent()
+{
+    return std::string("Korvex ") + BuildInfo::text();
+}
+
+}  // namespace
+
+KxCurlRequest::KxCurlRequest(std::shared_ptr<KxCurlHandleFactory> factory, const CurlShare& share,
+                             const std::string& url, const std::string& method)
+    : mFactory(std::move(factory))
+    , mEasy(mFactory->takeEasy())
+    , mOptions(mEasy.get(), mErrorText)
+    , mHeaderReceiver(mStatus, mFault)
+{
+    mOptions.setTransport(url, share, *mFactory);
+    mOptions.set(CURLOPT_USERAGENT, userAgent().c_str());
+    mOptions.set(CURLOPT_CUSTOMREQUEST, method.c_str());
+    mOptions.set(CURLOPT_WRITEFUNCTION, &receiveBody);
+    mOptions.set(CURLOPT_WRITEDATA, this);
+    mHeaderReceiver.attach(mEasy.get());
+}
+
+KxCurlRequest::~KxCurlRequest()
+{
+    mFactory->giveBack(std::move(mEasy));
+}
+
+void KxCurlRequest::perform(const QByteArray& body)
+{
+    mOptions.set(CURLOPT_POSTFIELDSIZE_LARGE, static_cast<curl_off_t>(body.size()));
+    mOptions.set(CURLOPT_POSTFIELDS, body.constData());
+    perform();
+}
+
+void KxCurlRequest::perform()
+{
+    try {
+        run();
+    } catch (const std::exception& fault) {
+        mStatus.failed = true;
+        mStatus.failure = fault.what();
+        throw;
+    }
+}
+
+void KxCurlRequest::run()
+{
+    mOptions.set(CURLOPT_HTTPHEADER, mHeaders.list());
+    const CURLcode code = curl_easy_perform(mEasy.get());
+    mFault.rethrow();
+    if (code != CURLE_OK)
+        throw CurlError(code, mErrorText.data());
+}
+
+std::size_t KxCurlRequest::receiveBody(char* bytes, std::size_t size, std::size_t count, void* request)
+{
+    auto& self = *static_cast<KxCurlRequest*>(request);
+    const std::size_t length = size * count;
+    return self.mFault.guard(length, [&] { self.takeBody(bytes, length); });
+}
+
+void KxCurlRequest::takeBody(const char* bytes, std::size_t length)
+{
+    if (length > static_cast<std::size_t>(kMaxResponseSize - mResponse.size()))
+        throw CurlError(CURLE_FILESIZE_EXCEEDED, "The response has a body of more than 1 GiB");
+    mResponse.append(bytes, static_cast<int>(length));
+    mStatus.bytesReceived += length;
+}
+
+}  // namespace Kdd

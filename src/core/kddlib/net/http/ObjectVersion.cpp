@@ -1,0 +1,31 @@
+#include "kddlib/net/http/ObjectVersion.h"
+
+#include "kddlib/net/http/KxHttpStatus.h"
+
+namespace Kdd
+{
+namespace
+{
+
+std::string headerOf(const KxHttpStatus& response, const char* name)
+{
+    const auto found = response.headers.find(name);
+    return found == response.headers.end() ? std::string() : found->second;
+}
+
+}  // namespace
+
+ObjectVersion ObjectVersion::of(const KxHttpStatus& response)
+{
+    return {headerOf(response, "etag"), headerOf(response, "x-goog-generation"),
+            headerOf(response, "last-modified")};
+}
+
+bool operator==(const ObjectVersion& a, const ObjectVersion& b)
+{
+    const bool hasStrong = !a.entityTag.empty() || !a.generation.empty();
+    return a.entityTag == b.entityTag && a.generation == b.generation &&
+           (hasStrong || a.lastModified == b.lastModified);
+}
+
+}  // namespace Kdd
