@@ -11,6 +11,14 @@ if(KDD_SANITIZE)
   target_compile_options(kdd_options INTERFACE -fsanitize=${KDD_SANITIZE} -fno-sanitize-recover=all
     -fno-omit-frame-pointer)
   target_link_options(kdd_options INTERFACE -fsanitize=${KDD_SANITIZE})
+  if(CMAKE_CXX_COMPILER_ID MATCHES "Clang")
+    # Clang leaves the sanitizers' run time to the program that loads a shared library.
+    target_link_options(kdd_options INTERFACE $<$<IN_LIST:$<TARGET_PROPERTY:TYPE>,SHARED_LIBRARY$<SEMICOLON>MODULE_LIBRARY>:-Wl,-z,undefs>)
+  endif()
+endif()
+if(KDD_FUZZ)
+  # The fuzzer sees where its inputs lead; tests of the same build are not hindered by it.
+  target_compile_options(kdd_options INTERFACE -fsanitize=fuzzer-no-link)
 endif()
 
 find_program(CCACHE ccache)
