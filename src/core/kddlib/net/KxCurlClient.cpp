@@ -1,6 +1,7 @@
 #include "kddlib/net/KxCurlClient.h"
 
-#include "kddlib/Limits.h"
+#include "kddlib/net/ClientSettings.h"
+#include "kddlib/net/cloud/CloudAddress.h"
 #include "kddlib/net/cloud/KxCurlUploadStream.h"
 #include "kddlib/net/cloud/KxCurlUploadStreambuf.h"
 #include "kddlib/net/cloud/KxGoogleAuth.h"
@@ -8,10 +9,11 @@
 #include "kddlib/net/http/KxCurlDownloadStream.h"
 #include "kddlib/net/http/KxCurlDownloadStreambuf.h"
 #include "kddlib/net/http/KxCurlRequest.h"
-#include "kddlib/net/http/PreparedRequest.h"
 #include "kddlib/net/http/Redirects.h"
 #include "kddlib/net/http/RequestAddress.h"
 #include "kddlib/net/http/TlsLocks.h"
+#include "kddlib/net/http/WholeBody.h"
+#include "platform/base/Result.h"
 #include "platform/resources/ExResource.h"
 
 #include <QJsonDocument>
@@ -20,6 +22,7 @@
 #include <algorithm>
 #include <mutex>
 #include <stdexcept>
+#include <string_view>
 #include <thread>
 #include <utility>
 
@@ -29,7 +32,6 @@ namespace
 {
 
 constexpr std::size_t kIdleHandles = 48;
-constexpr int kFirstReadSize = 128 * 1024;  // [bytes]
 
 /// Curl and the library below it, once for the process.
 void setUpCurl()
@@ -51,43 +53,8 @@ CurlShare::Connections connectionsOfSite()
 
 void requireCloudObject(const std::string& address)
 {
-    if (const std::string reason = whyNoCloudObject(address); !reason.empty())
-        throw std::invalid_argument(address + ' ' + reason);
-}
-
-/// The rest of a stream of which nobody says how long it is, up to the bound of a response.
-QByteArray readUntilEnd(std::istream& stream)
-{
-    QByteArray bytes(kFirstReadSize, Qt::Uninitialized);
-    qint64 got = 0;
-    while (got < kMaxResponseSize && stream.read(bytes.data() + got, bytes.size() - got).gcount() > 0) {
-        got += stream.gcount();
-        if (got > bytes.size() / 2)
-            bytes.resize(static_cast<int>(qMin(2 * qint64(bytes.size()), kMaxResponseSize)));
-    }
-    bytes.resize(static_cast<int>(got));
-    return bytes;
-}
-
-/// The whole body, and what became of the transfer.
-QByteArray readWhole(KxCurlDownloadStream& stream, KxHttpStatus& status)
-{
-    const qint64 length = stream.httpStatus().failed ? 0 : stream.contentLength();
-    QByteArray bytes;
-    if (length > 0 && length <= kMaxResponseSize) {
-        bytes = QByteArray(static_cast<int>(length), Qt::Uninitialized);
-        bytes.resize(static_cast<int>(stream.read(bytes.data(), length).gcount()));
-        stream.peek();  // sees the end, with which the connection is free for the next
-    } else {
-        bytes = readUntilEnd(stream);
-    }
-    status = stream.httpStatus();
-    // No status of the server tells that reading ended at our bound.
-    if (stream.isOpen() && !status.failed) {
-        status.failed = true;
-        status.failure = "The response has a body of more than 1 GiB";
-    }
-    return bytes;
+    if (const Result result = checkCloudObject(address); result.bad())
+        throw std::invalid_argument(address + ' ' + result.text().toStdString());
 }
 
 }  // namespace
@@ -161,7 +128,7 @@ QJsonDocument KxCurlClient::Private::post(const std::function<PreparedRequest()>
     origin.body = body;
     origin.hasBody = RequestBody::Sent;
     KxCurlDownloadStream stream = open(std::move(origin), std::nullopt);
-    return QJsonDocument::fromJson(readWhole(stream, status));
+    return QJsonDocument::fromJson(readWholeBody(stream, status));
 }
 
 KxCurlClient::KxCurlClient()
@@ -181,7 +148,8 @@ KxCurlClient& KxCurlClient::instance()
 
 bool KxCurlClient::isUrl(const char* name)
 {
-    return Kdd::isUrl(name);
+    const std::string_view text = name ? name : "";
+    return text.substr(0, 4) == "http" || text.substr(0, 2) == "gs";
 }
 
 std::string KxCurlClient::url(const std::string& path)
@@ -276,27 +244,26 @@ KxCurlDownloadStream KxCurlClient::readFollowing(const std::string& url, qint64 
         const auto prepare = [=] {
             const ClientSettings settings = mPrivate->currentSettings();
             PreparedRequest first = prepareRequest(url, headers, RequestBody::None, settings);
-            return redirects ? redirects->prepared(std::move(first), settings) : first;
+            return redirects ? redirects->prepared(std::move(first), settings.sessionId) : first;
         };
         KxCurlDownloadStream stream = mPrivate->get(prepare, range);
         if (!redirects)
             redirects.emplace(prepareRequest(url, {}, RequestBody::None, ClientSettings()).url);
-        switch (redirects->take(stream.httpStatus())) {
-        case Redirects::Answer::Final:
-            return stream;
-        case Redirects::Answer::Refused:
-            static_cast<KxCurlDownloadStreambuf*>(stream.rdbuf())->currentRequest()->fail(redirects->fault());
-            return stream;
-        case Redirects::Answer::GoOn:
-            break;
-        }
+        Result result;
+        if (redirects->follow(stream.httpStatus(), result))
+            continue;
+        if (result.bad())
+            static_cast<KxCurlDownloadStreambuf*>(stream.rdbuf())
+                ->currentRequest()
+                ->fail(result.text().toStdString());
+        return stream;
     }
 }
 
 QByteArray KxCurlClient::readBytes(const std::string& url, KxHttpStatus& status)
 {
     KxCurlDownloadStream stream = read(url, true);
-    return readWhole(stream, status);
+    return readWholeBody(stream, status);
 }
 
 QJsonDocument KxCurlClient::readJson(const std::string& url, KxHttpStatus& status)
@@ -321,6 +288,14 @@ QJsonDocument KxCurlClient::postWithoutSession(const std::string& url, const QBy
         return prepareRequest(url, {"Content-Type: " + contentType}, RequestBody::Sent, ClientSettings());
     };
     return mPrivate->post(prepare, body, status);
+}
+
+QByteArray KxGoogleAuth::authorizationHeader(KxCurlClient& client)
+{
+    return authorizationHeader(
+        [&client](const std::string& url, const QByteArray& form, KxHttpStatus& status) {
+            return client.postWithoutSession(url, form, "application/x-www-form-urlencoded", status);
+        });
 }
 
 QJsonDocument KxCurlClient::postBytes(const std::string& url, const QByteArray& body, KxHttpStatus& status)

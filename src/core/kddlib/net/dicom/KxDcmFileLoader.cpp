@@ -1,13 +1,13 @@
 #include "kddlib/net/dicom/KxDcmFileLoader.h"
 
 #include "kddlib/net/KxCurlClient.h"
-#include "kddlib/net/cloud/StoragePath.h"
 #include "kddlib/net/dicom/DamagedFile.h"
 #include "kddlib/net/dicom/DcmInputCurlStream.h"
 #include "kddlib/net/dicom/DcmInputHttpStream.h"
 #include "kddlib/net/dicom/DicomParse.h"
 #include "kddlib/net/dicom/ForwardedStream.h"
 #include "kddlib/net/dicom/LocalFileStream.h"
+#include "kddlib/net/dicom/StoragePath.h"
 #include "kddlib/net/http/CurlError.h"
 #include "platform/base/LogFile.h"
 #include "platform/database/Kxg.h"
@@ -58,10 +58,8 @@ std::string bearerToken()
 bool isAnswered(const char* name, KxCurlDownloadStream& stream)
 {
     const KxHttpStatus& status = stream.httpStatus();
-    if (status.failed)
-        LogFile::errorf("Reading %s failed: %s", name, status.failure.c_str());
-    else if (!status.ok())
-        LogFile::errorf("Reading %s failed: HTTP response code %d", name, status.code);
+    if (!status.ok())
+        LogFile::errorf("Reading %s failed: %s", name, status.reason().c_str());
     return status.ok();
 }
 

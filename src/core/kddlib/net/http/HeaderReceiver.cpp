@@ -2,6 +2,7 @@
 
 #include "kddlib/net/http/CurlError.h"
 #include "kddlib/net/http/KxHttpStatus.h"
+#include "kddlib/net/http/LowerCase.h"
 
 #include <string>
 
@@ -14,16 +15,6 @@ void check(CURLcode code)
 {
     if (code != CURLE_OK)
         throw CurlError(code);
-}
-
-std::string lowerCase(std::string_view text)
-{
-    std::string lower(text);
-    for (char& letter : lower) {
-        if (letter >= 'A' && letter <= 'Z')
-            letter = static_cast<char>(letter - 'A' + 'a');
-    }
-    return lower;
 }
 
 /// What follows the colon. The blank there is customary, not required.

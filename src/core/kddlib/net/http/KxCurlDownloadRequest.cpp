@@ -1,5 +1,6 @@
 #include "kddlib/net/http/KxCurlDownloadRequest.h"
 
+#include "kddlib/net/http/HttpAnswer.h"
 #include "platform/base/LogFile.h"
 
 #include <algorithm>
@@ -19,10 +20,6 @@ constexpr std::size_t kSpillCapacity = 1024 * 1024;  // [bytes]
 /// What curl takes from the socket at a time. More than its default of 16 KiB, so that the system is asked less often.
 constexpr long kReceiveBuffer = 256 * 1024;  // [bytes]
 
-constexpr int kOk = 200;
-constexpr int kPartialContent = 206;
-constexpr int kRangeNotSatisfiable = 416;
-
 constexpr char kRangeIgnored[] = "The server sends the whole object where a range was asked for";
 
 /// The range that a header line asks for.
@@ -38,12 +35,6 @@ std::size_t spillCapacity(const std::optional<ByteRange>& range)
 {
     // A range that is fetched ahead of the reader must find room as a whole, else its connection would stand still.
     return range ? std::max(static_cast<std::size_t>(range->length()), kSpillCapacity) : kSpillCapacity;
-}
-
-std::optional<ContentRange> contentRangeOf(const KxHttpStatus& status)
-{
-    const auto found = status.headers.find("content-range");
-    return found == status.headers.end() ? std::nullopt : ContentRange::parse(found->second);
 }
 
 }  // namespace

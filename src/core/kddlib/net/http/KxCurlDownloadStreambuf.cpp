@@ -1,5 +1,6 @@
 #include "kddlib/net/http/KxCurlDownloadStreambuf.h"
 
+#include "kddlib/net/http/HttpAnswer.h"
 #include "platform/base/LogFile.h"
 
 #include <algorithm>
@@ -13,7 +14,6 @@ namespace
 {
 
 constexpr std::size_t kGetBufferSize = 16 * 1024;
-constexpr int kPartialContent = 206;
 
 /// Splits what is left into parts of about the length of the first, all equal but for the last.
 qint64 spanOf(qint64 remaining, qint64 first)
@@ -159,27 +159,8 @@ qint64 KxCurlDownloadStreambuf::findContentLength()
         LogFile::warnf("Could not get content length. No request object.");
         return 0;
     }
-    if (mPlanned)
-        return mTotal;
-    const auto& headers = request->status().headers;
-    const auto range = headers.find("content-range");
-    if (request->status().code == kPartialContent && range != headers.end()) {
-        const std::size_t slash = range->second.find('/');
-        if (slash == std::string::npos)
-            LogFile::warnf("Could not parse Content-Range: %s", range->second.c_str());
-        else
-            return parseByteCount(std::string_view(range->second).substr(slash + 1)).value_or(0);
-    }
-    const auto length = headers.find("content-length");
-    if (length != headers.end())
-        return parseByteCount(length->second).value_or(0);
-    const auto encoding = headers.find("transfer-encoding");
-    if (encoding != headers.end() && encoding->second == "chunked")
-        return 0;
-    LogFile::warnf("Could not get content length. Received headers:");
-    for (const auto& [name, value] : headers)
-        LogFile::warnf("%s: %s", name.c_str(), value.c_str());
-    return 0;
+    // Of later ranges the answer may not be in yet, and all of them have the total of the first.
+    return mPlanned ? mTotal : objectLengthOf(request->status());
 }
 
 }  // namespace Kdd

@@ -1,5 +1,7 @@
 #include "kddlib/net/http/WebOrigin.h"
 
+#include "kddlib/net/http/LowerCase.h"
+
 #include <curl/curl.h>
 
 #include <memory>
@@ -27,15 +29,6 @@ std::string partOf(const Url& url, CURLUPart part, unsigned int flags = 0)
     const CURLUcode code = curl_url_get(url.get(), part, &text, flags);
     const std::unique_ptr<char, TextFree> owner(text);
     return code == CURLUE_OK && text ? std::string(text) : std::string();
-}
-
-std::string lowerCase(std::string text)
-{
-    for (char& letter : text) {
-        if (letter >= 'A' && letter <= 'Z')
-            letter = static_cast<char>(letter - 'A' + 'a');
-    }
-    return text;
 }
 
 }  // namespace

@@ -1,4 +1,4 @@
-#include "kddlib/net/cloud/StoragePath.h"
+#include "kddlib/net/dicom/StoragePath.h"
 
 #include "kddlib/net/http/RequestAddress.h"
 

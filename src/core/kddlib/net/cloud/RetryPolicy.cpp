@@ -1,4 +1,4 @@
-#include "kddlib/net/http/RetryPolicy.h"
+#include "kddlib/net/cloud/RetryPolicy.h"
 
 #include <algorithm>
 #include <cmath>
