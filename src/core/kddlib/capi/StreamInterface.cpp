@@ -23,12 +23,9 @@ struct UserInfo
 bool isOk(KxCurlDownloadStream& stream, const char* url)
 {
     const KxHttpStatus& status = stream.httpStatus();
-    if (status.ok())
-        return true;
-    const std::string reason =
-        status.failed ? stream.failure() : "HTTP response code " + std::to_string(status.code);
-    LogFile::errorf("Reading %s failed: %s", url, reason.c_str());
-    return false;
+    if (!status.ok())
+        LogFile::errorf("Reading %s failed: %s", url, status.reason().c_str());
+    return status.ok();
 }
 
 template <typename Opening>
