@@ -35,19 +35,6 @@ QByteArray madeOf(const QByteArray& bytes)
 
 }  // namespace
 
-CloudStore::CloudStore()
-    : mServer([this](const QByteArray& request) { return serve(request); })
-{
-    qputenv("KDD_CLOUD_API", mServer.url("").c_str());
-    qputenv("KDD_CLOUD_UPLOAD", mServer.url("").c_str());
-}
-
-CloudStore::~CloudStore()
-{
-    qunsetenv("KDD_CLOUD_API");
-    qunsetenv("KDD_CLOUD_UPLOAD");
-}
-
 QByteArray CloudStore::object(const QByteArray& path) const
 {
     const std::lock_guard lock(mMutex);

@@ -104,6 +104,11 @@ void NginxServer::addFile(const char* name, const QByteArray& content) const
         throw std::runtime_error("Cannot write " + file.fileName().toStdString());
 }
 
+QByteArray httpResponse(const QByteArray& body, const QByteArray& code)
+{
+    return "HTTP/1.1 " + code + "\r\nContent-Length: " + QByteArray::number(body.size()) + "\r\n\r\n" + body;
+}
+
 ScriptedServer::ScriptedServer(Script script)
     : mScript(std::move(script))
     , mOrigin("http://127.0.0.1:")

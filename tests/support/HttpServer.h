@@ -36,6 +36,9 @@ private:
     std::string mOrigin;
 };
 
+/// A response as it should be.
+QByteArray httpResponse(const QByteArray& body, const QByteArray& code = "200 OK");
+
 /// Does to a client what no proper server would. Each connection is for one request and has a thread.
 class ScriptedServer
 {
@@ -52,6 +55,12 @@ public:
     using Script = std::function<Reply(const QByteArray& request)>;
 
     explicit ScriptedServer(Script script);
+
+    /// Gives the same bytes to everybody.
+    explicit ScriptedServer(const QByteArray& reply)
+        : ScriptedServer([reply](const QByteArray& /*request*/) { return Reply{reply}; })
+    {
+    }
     ~ScriptedServer();
 
     std::string url(const std::string& path) const { return mOrigin + path; }

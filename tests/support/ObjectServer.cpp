@@ -18,8 +18,7 @@ ScriptedServer::Reply ObjectServer::reply(const QByteArray& request) const
 {
     const int at = request.indexOf("\r\nRange: bytes=");
     if (at < 0)
-        return {"HTTP/1.1 200 OK\r\nContent-Length: " + QByteArray::number(mObject.size()) + "\r\n\r\n" +
-                mObject};
+        return {httpResponse(mObject)};
     const QByteArray range = request.mid(at + 15, request.indexOf('\r', at + 2) - at - 15);
     Answer answer;
     answer.first = range.split('-').at(0).toInt();
