@@ -270,8 +270,8 @@ TEST_F(GoogleAuth, RefusesAnswersWithoutAUsableToken)
 
 QByteArray tokenAnswer(const QByteArray& token, int lifetime)
 {
-    return httpResponse("{\"access_token\":\"" + token + "\",\"token_type\":\"Bearer\",\"expires_in\":" +
-                        QByteArray::number(lifetime) + '}');
+    return httpResponse("{\"access_token\":\"" + token +
+                        "\",\"token_type\":\"Bearer\",\"expires_in\":" + QByteArray::number(lifetime) + '}');
 }
 
 TEST(CloudClient, AuthorizesWhatItUploadsAndDeletes)
@@ -297,43 +297,33 @@ TEST(CloudClient, AuthorizesWhatItUploadsAndDeletes)
     EXPECT_TRUE(tokens.requests().back().contains("\r\nContent-Type: application/x-www-form-urlencoded\r\n"));
 }
 
-/// A client that is given another token for each request.
-class ShortTokens : public testing::Test
+/// How many different tokens the requests carried.
+int tokensOf(const std::vector<QByteArray>& requests)
 {
-protected:
-    ShortTokens() { client.setGoogleAuthentication(account().key(tokens.url(""))); }
+    QSet<QByteArray> lines;
+    for (const QByteArray& request : requests)
+        lines.insert(request.mid(request.indexOf("\r\nAuthorization: ") + 2, 26));
+    EXPECT_FALSE(lines.contains(""));
+    return lines.size();
+}
 
-    /// How many different tokens the requests carried.
-    static int tokensOf(const std::vector<QByteArray>& requests)
-    {
-        QSet<QByteArray> lines;
-        for (const QByteArray& request : requests)
-            lines.insert(request.mid(request.indexOf("\r\nAuthorization: ") + 2, 26));
-        EXPECT_FALSE(lines.contains(""));
-        return lines.size();
-    }
-
+TEST(CloudClient, AuthorizesEachRangeAndChunkByTheTokenOfItsTime)
+{
     std::atomic<int> count{0};
-    const ScriptedServer tokens{[this](const QByteArray&) -> ScriptedServer::Reply {
+    const ScriptedServer tokens([&](const QByteArray&) -> ScriptedServer::Reply {
         return {tokenAnswer('t' + QByteArray::number(++count), 0)};
-    }};
+    });
     KxCurlClient& client = KxCurlClient::instance();
-};
-
-TEST_F(ShortTokens, AuthorizeEachRangeByThatOfItsTime)
-{
-    const ObjectServer store(someObject(8000));
-    const Setting host("KDD_CLOUD_DOWNLOAD", store.origin());
+    client.setGoogleAuthentication(account().key(tokens.url("")));
+    const ObjectServer object(someObject(8000));
+    const Setting host("KDD_CLOUD_DOWNLOAD", object.origin());
     client.setNumConcurrentRequestsPerFile(2);
     client.setChunkSizeForPartialRequests(2000);
     KxHttpStatus status;
     EXPECT_EQ(client.readBytes("gs://b/x", status), someObject(8000));
     client.setNumConcurrentRequestsPerFile(1);
-    EXPECT_EQ(tokensOf(store.requests()), 4);
-}
+    EXPECT_EQ(tokensOf(object.requests()), 4);
 
-TEST_F(ShortTokens, AuthorizeEachChunkByThatOfItsTime)
-{
     const CloudStore store;
     KxCurlUploadStream stream = client.write("gs://b/long");
     for (int i = 0; i < 3; ++i)
