@@ -127,6 +127,7 @@ int ReadDicomFromUrl(const char* url, void* userInfo, uint32_t* length, const ch
         const std::streamsize count = readBlock(info, url != nullptr ? url : "the object");
         const bool isOver = count < 0 || info.stream.eof();
         if (isOver)
+            // Frees the connection: who has got the last block may keep the user info for long.
             info.stream.close();
         if (count < 0)
             return KDD_NOT_READ;

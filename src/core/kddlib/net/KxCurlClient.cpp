@@ -31,11 +31,13 @@ namespace Kdd
 namespace
 {
 
+/// More threads than that at once only find fewer connections open.
 constexpr std::size_t kIdleHandles = 48;
 
 /// Curl and the library below it, once for the process.
 void setUpCurl()
 {
+    // Once and before any handle, for other threads must not be in the libraries meanwhile.
     static std::once_flag once;
     std::call_once(once, [] {
         if (const CURLcode code = curl_global_init(CURL_GLOBAL_ALL))
@@ -61,6 +63,7 @@ void requireCloudObject(const std::string& address)
 
 struct KxCurlClient::Private
 {
+    /// A copy, so that no request sees half of a change.
     ClientSettings currentSettings() const
     {
         const std::lock_guard lock(mutex);
@@ -103,6 +106,7 @@ KxCurlDownloadStream KxCurlClient::Private::open(KxCurlDownloadRequest::Origin o
     const int concurrent = currentSettings().numConcurrentRequestsPerFile;
     auto buffer = std::make_unique<KxCurlDownloadStreambuf>(std::move(origin), firstRange, concurrent);
     KxCurlDownloadStream stream(buffer.release());
+    // Who gets the stream may ask for the answer's code and length at once.
     stream.peek();
     return stream;
 }
@@ -142,6 +146,7 @@ KxCurlClient::KxCurlClient()
 
 KxCurlClient& KxCurlClient::instance()
 {
+    // Never destroyed: threads may still be at work when the process ends.
     static auto* const client = new KxCurlClient;
     return *client;
 }
@@ -227,6 +232,7 @@ KxCurlDownloadStream KxCurlClient::readRange(const std::string& url, const std::
 KxCurlDownloadStream KxCurlClient::readFrom(const std::string& url, qint64 start)
 {
     const auto range = firstRange(mPrivate->currentSettings(), start);
+    // Without parallel ranges one open range does, which any server that knows ranges answers.
     if (!range)
         return readRange(url, std::to_string(start) + '-', false);
     return mPrivate->get(
@@ -246,6 +252,7 @@ KxCurlDownloadStream KxCurlClient::readFollowing(const std::string& url, qint64 
             PreparedRequest first = prepareRequest(url, headers, RequestBody::None, settings);
             return redirects ? redirects->prepared(std::move(first), settings.sessionId) : first;
         };
+        // Its later ranges are prepared in the same way, so they are told no more than the first.
         KxCurlDownloadStream stream = mPrivate->get(prepare, range);
         if (!redirects)
             redirects.emplace(prepareRequest(url, {}, RequestBody::None, ClientSettings()).url);

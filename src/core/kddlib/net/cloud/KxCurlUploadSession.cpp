@@ -145,6 +145,7 @@ void KxCurlUploadSession::sendChunk(const QByteArray& rest, Chunk kind)
     std::string range = "Content-Range: bytes ";
     range += rest.isEmpty() ? "*" : std::to_string(start) + '-' + std::to_string(end - 1);
     range += '/' + (kind == Chunk::Last ? std::to_string(end) : std::string("*"));
+    // Before it is sent: of a transfer that breaks off all bytes may have come.
     mSentEnd = std::max(mSentEnd, end);
     const int code = exchange("PUT", mSessionUrl, {contentLength(rest.size()), range}, rest);
     if (code != kResumeIncomplete && !mIsComplete)
@@ -224,6 +225,7 @@ std::vector<std::string> KxCurlUploadSession::storageHeaders(const std::string& 
 void KxCurlUploadSession::take(const KxCurlRequest& request)
 {
     const KxHttpStatus& status = request.status();
+    // Without an address there is no session: a server that answers the start by 200 has not made one.
     const bool isOpen = !mSessionUrl.empty();
     if (isOpen && (status.code == kOk || status.code == kCreated)) {
         takeEnd(request);
@@ -268,6 +270,7 @@ void KxCurlUploadSession::takeRange(const std::string& range)
 
 void KxCurlUploadSession::takeEnd(const KxCurlRequest& request)
 {
+    // Else an object that lacks its end would pass for the whole.
     if (!mTotal || mSentEnd < *mTotal)
         throw UnrecoverableResponseError(
             "The cloud storage ended the upload before the last bytes were sent");

@@ -148,6 +148,7 @@ QByteArray KxGoogleAuth::Private::takeAnswer(const QJsonDocument& answer, qint64
     const QString token = answer.object().value(QLatin1String("access_token")).toString();
     const QString type = answer.object().value(QLatin1String("token_type")).toString();
     const double lifetime = answer.object().value(QLatin1String("expires_in")).toDouble();
+    // The former token stays: until its own margin it is as good as before.
     if (!isHeaderText(token) || !isHeaderText(type)) {
         LogFile::errorf("Invalid authorization response. %s", withoutToken(answer).constData());
         return {};

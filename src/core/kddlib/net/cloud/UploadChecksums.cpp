@@ -67,6 +67,7 @@ Result UploadChecksums::compare(const KxHttpStatus& status, const QByteArray& re
     Claims claims = claimsOf(status, response);
     for (const auto& [name, value] : own()) {
         const std::string& claim = claims[name];
+        // What the storage does not name speaks for nothing and against nothing.
         if (!claim.empty() && claim != value)
             return Result::failure(QString::fromStdString(name + ' ' + claim + " instead of " + value));
     }

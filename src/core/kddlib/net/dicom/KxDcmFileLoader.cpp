@@ -44,6 +44,7 @@ struct Settings
 
 Settings& settings()
 {
+    // Never destroyed: threads may still be loading when the process ends.
     static auto* const all = new Settings;
     return *all;
 }
@@ -112,6 +113,7 @@ OFCondition loadLocal(const char* name, DcmFileFormat& file, const ParseOptions&
 {
     DepthLimited<LocalFileStream> stream(name);
     const OFCondition condition = parseDicom(stream, file, options);
+    // A caller's own reader wants a part of the file, and only he knows whether he has got it.
     return condition.good() || options.reader ? condition : readAsRegistered(name, file, condition);
 }
 
@@ -120,6 +122,7 @@ OFCondition load(const char* name, DcmFileFormat& file, Mode mode, ParseOptions 
     const bool isUrl = KxCurlClient::isUrl(name);
     if (mode == Mode::Default)
         mode = KxDcmFileLoader::defaultMode();
+    // A download cannot be read a second time, and the other modes are for callers who want all values.
     if (isUrl || mode != Mode::BoundedLocal)
         options.maxReadLength = kReadAll;
     if (isUrl)

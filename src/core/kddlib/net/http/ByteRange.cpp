@@ -42,6 +42,7 @@ std::optional<std::string_view> ContentRange::totalIn(std::string_view value)
 
 std::optional<ContentRange> ContentRange::parse(std::string_view value)
 {
+    // Strict, for bytes that were put at a guessed place would be taken for the object's own.
     constexpr std::string_view kUnit = "bytes ";
     const auto totalText = totalIn(value);
     const std::size_t dash = value.find('-');
@@ -62,6 +63,7 @@ std::optional<ContentRange> ContentRange::parse(std::string_view value)
 
 WantedRange::WantedRange(std::string_view text)
 {
+    // What is of none of the three forms stays Unknown: several ranges, or a server's own unit.
     const std::size_t dash = text.find('-');
     if (dash == kNowhere)
         return;
@@ -80,6 +82,8 @@ WantedRange::WantedRange(std::string_view text)
 bool WantedRange::isAnsweredBy(const ContentRange& answer) const
 {
     const ByteRange& range = answer.range;
+    // Fewer bytes than asked for are right only where the object ends. A server that does not know where
+    // that is has to be believed.
     const bool isToTheEnd = answer.total < 0 || range.last == answer.total - 1;
     switch (mForm) {
     case Closed:

@@ -138,6 +138,7 @@ bool KxCurlDownloadRequest::resume()
 
 void KxCurlDownloadRequest::abort()
 {
+    // Marked first, so that bytes which curl still offers are refused.
     mAborted = true;
     mDone = true;
     mMulti->remove(*this);
@@ -145,6 +146,7 @@ void KxCurlDownloadRequest::abort()
 
 void KxCurlDownloadRequest::fail(const std::string& reason, const char* what)
 {
+    // What comes after the first fault is its consequence.
     if (mStatus.failed)
         return;
     LogFile::tracef(3, "CURL", "%s: %s", what, reason.c_str());
@@ -165,9 +167,11 @@ void KxCurlDownloadRequest::complete(CURLcode code)
     mMulti->remove(*this);
     if (mAnswer == Answer::Awaited && code == CURLE_OK)
         judgeAnswer();
+    // These ended the transfer themselves: that curl calls it an error says nothing.
     if (mAborted || needsWholeObject() || mAnswer == Answer::Refused)
         return;
     try {
+        // What a callback threw is the cause; curl only knows that the callback gave up.
         mFault.rethrow();
         if (code != CURLE_OK)
             fail(reasonOf(code));
@@ -194,6 +198,7 @@ std::size_t KxCurlDownloadRequest::takeBody(const char* bytes, std::size_t lengt
         judgeAnswer();
     if (mAborted || mAnswer != Answer::Taken)
         return 0;
+    // Bytes beyond it would stand where those of the next range belong.
     if (mPart && mStatus.bytesReceived + length > static_cast<quint64>(mPart->range.length())) {
         refuse("The server sends more than the range that was asked for");
         return 0;
@@ -227,6 +232,7 @@ void KxCurlDownloadRequest::judgeAnswer()
 KxCurlDownloadRequest::Answer KxCurlDownloadRequest::judgeRange()
 {
     const int code = mStatus.code;
+    // Part of the object has been delivered: neither a page that tells of an error nor the whole can follow.
     if (mExpected && code != kPartialContent)
         return refuse("The server answers a later range with code " + std::to_string(code));
     if (code == kOk && mRange->first > 0)
@@ -245,6 +251,7 @@ KxCurlDownloadRequest::Answer KxCurlDownloadRequest::judgeRange()
     if (part->range.first != mRange->first || part->range.last != last)
         return refuse("The server sends " + part->range.text() + " where " + mRange->text() +
                       " was asked for");
+    // Further ranges cannot be planned then. Nothing is lost by asking anew, unless the caller began midway.
     if (part->total < 0)
         return mRange->first == 0 ? Answer::NoRanges
                                   : refuse("The server does not say how long the object is");

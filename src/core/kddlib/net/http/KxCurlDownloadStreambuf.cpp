@@ -18,6 +18,7 @@ constexpr std::size_t kGetBufferSize = 16 * 1024;
 /// Splits what is left into parts of about the length of the first, all equal but for the last.
 qint64 spanOf(qint64 remaining, qint64 first)
 {
+    // To the nearest: no part is longer than one and a half of the first, by which the memory is reckoned.
     const float quotient = static_cast<float>(remaining) / static_cast<float>(first);
     const qint64 parts = std::max<qint64>(1, std::llround(quotient));
     return remaining / parts + (remaining % parts != 0 ? 1 : 0);
@@ -38,8 +39,11 @@ KxCurlDownloadRequest* KxCurlDownloadStreambuf::currentRequest()
     if (mRequests.empty())
         return nullptr;
     KxCurlDownloadRequest& front = *mRequests.front();
+    // It stays in front: nothing may be delivered behind a gap.
     if (front.status().failed)
         return &front;
+    // A request may fail to be made, for want of memory or of a token. To the reader that is a transfer that broke
+    // off, for he may be inside a stream that throws nothing.
     try {
         if (front.needsWholeObject())
             fetchWhole();
@@ -75,8 +79,10 @@ void KxCurlDownloadStreambuf::advance()
 {
     if (mNext < mTotal)
         mRequests.push_back(nextRequest());
+    // The last one stays: its status is that of the download.
     if (mRequests.size() < 2)
         return;
+    // For whoever asks while the next one has no answer yet.
     mFinished = mRequests.front()->status();
     mRequests.pop_front();
 }
@@ -104,6 +110,7 @@ std::streamsize KxCurlDownloadStreambuf::xsgetn(char* to, std::streamsize count)
     if (got > 0)
         std::memcpy(to, gptr(), static_cast<std::size_t>(got));
     gbump(static_cast<int>(got));
+    // Straight into the caller's memory: long reads are not copied twice.
     while (got < count) {
         const std::streamsize more = fetch(to + got, count - got);
         if (more == 0)
@@ -117,6 +124,7 @@ std::streamsize KxCurlDownloadStreambuf::xsgetn(char* to, std::streamsize count)
 std::streamsize KxCurlDownloadStreambuf::fetch(char* to, std::streamsize count)
 {
     while (isOpen()) {
+        // Nothing means that this request is at its end, whereupon the next is in front or none is open.
         const std::size_t got = mRequests.front()->read(to, static_cast<std::size_t>(count));
         if (got > 0)
             return static_cast<std::streamsize>(got);

@@ -38,6 +38,7 @@ WebOrigin originOf(const std::string& url)
     const Url parts(curl_url());
     if (!parts || curl_url_set(parts.get(), CURLUPART_URL, url.c_str(), 0) != CURLUE_OK)
         return {};
+    // With the usual port named, so that an address with it and one without are one origin.
     WebOrigin origin = {lowerCase(partOf(parts, CURLUPART_SCHEME)), lowerCase(partOf(parts, CURLUPART_HOST)),
                         partOf(parts, CURLUPART_PORT, CURLU_DEFAULT_PORT)};
     const bool isWeb = origin.scheme == "http" || origin.scheme == "https";
