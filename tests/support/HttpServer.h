@@ -36,6 +36,9 @@ private:
     std::string mOrigin;
 };
 
+/// The value of a header line of a request; empty when it is not there, or more than once.
+QByteArray headerOf(const QByteArray& request, const QByteArray& name);
+
 /// A response as it should be.
 QByteArray httpResponse(const QByteArray& body, const QByteArray& code = "200 OK");
 

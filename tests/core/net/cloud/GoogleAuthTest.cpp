@@ -302,7 +302,7 @@ int tokensOf(const std::vector<QByteArray>& requests)
 {
     QSet<QByteArray> lines;
     for (const QByteArray& request : requests)
-        lines.insert(request.mid(request.indexOf("\r\nAuthorization: ") + 2, 26));
+        lines.insert(headerOf(request, "Authorization"));
     EXPECT_FALSE(lines.contains(""));
     return lines.size();
 }

@@ -115,10 +115,10 @@ TEST_F(Upload, SendsWholeChunksAndThenTheRest)
     EXPECT_TRUE(stream.good() && !stream.isOpen());
     EXPECT_EQ(store.object("b/o"), bytes);
     ASSERT_EQ(store.requests().size(), 4U);
-    EXPECT_TRUE(request(0).contains("\r\nAuthorization: Bearer t\r\n"));
-    EXPECT_TRUE(request(1).contains("\r\nContent-Range: bytes 0-262143/*\r\n"));
-    EXPECT_TRUE(request(2).contains("\r\nContent-Range: bytes 262144-786431/*\r\n"));
-    EXPECT_TRUE(request(3).contains("\r\nContent-Range: bytes 786432-1048574/1048575\r\n"));
+    EXPECT_EQ(headerOf(request(0), "Authorization"), "Bearer t");
+    EXPECT_EQ(headerOf(request(1), "Content-Range"), "bytes 0-262143/*");
+    EXPECT_EQ(headerOf(request(2), "Content-Range"), "bytes 262144-786431/*");
+    EXPECT_EQ(headerOf(request(3), "Content-Range"), "bytes 786432-1048574/1048575");
     EXPECT_FALSE(request(1).contains("Expect:") || request(1).contains("Content-Type:"));
 }
 
@@ -251,7 +251,7 @@ TEST_F(Upload, TriesAgainWhenThereIsNoTokenForAMoment)
     EXPECT_EQ(store.object("b/o"), "bytes");
     EXPECT_EQ(waits.size(), 1U);
     for (const QByteArray& sent : store.requests())
-        EXPECT_TRUE(sent.contains("\r\nAuthorization: Bearer t\r\n"));
+        EXPECT_EQ(headerOf(sent, "Authorization"), "Bearer t");
 }
 
 TEST_F(Upload, LogsErrorsInTheirOwnLinesAndLeavesTheLastToTheCallerOnRequest)
@@ -278,8 +278,7 @@ TEST_F(Upload, KeepsTheAuthorizationFromOtherHosts)
     EXPECT_EQ(upload("bytes"), "");
     EXPECT_TRUE(other.requests().at(0).endsWith("\r\n\r\nbytes"));
     EXPECT_FALSE(other.requests().at(0).contains("Authorization"));
-    EXPECT_TRUE(other.requests().at(0).contains(
-        "Host: " + QByteArray::fromStdString(other.url("").substr(7)).chopped(1)));
+    EXPECT_EQ("http://" + headerOf(other.requests().at(0), "Host") + '/', other.url("").c_str());
     const NginxServer secure(NginxServer::Scheme::Https,
                              "location / { add_header Location http://127.0.0.1:1/s; return 201; }");
     EXPECT_THAT(upload("bytes", secure.url("b/o")), HasSubstr("http://127.0.0.1:1/s")) << "from HTTPS";
