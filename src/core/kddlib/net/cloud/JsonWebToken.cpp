@@ -98,7 +98,7 @@ Result signJsonWebToken(const QJsonObject& header, const QJsonObject& claims, co
 {
     const QByteArray text = encoded(header) + '.' + encoded(claims);
     QByteArray signature;
-    const Result result = sign(text, privateKey, signature);
+    Result result = sign(text, privateKey, signature);
     if (result.good())
         token = text + '.' + encoded(signature);
     return result;

@@ -254,12 +254,12 @@ void KxCurlUploadSession::takeLocation(const std::string& location)
 
 void KxCurlUploadSession::takeRange(const std::string& range)
 {
-    constexpr std::string_view kStart = "bytes=0-";
-    if (range.compare(0, kStart.size(), kStart) != 0)
+    constexpr std::string_view kPrefix = "bytes=0-";
+    if (range.compare(0, kPrefix.size(), kPrefix) != 0)
         return;
     quint64 last = 0;
     const char* const textEnd = range.data() + range.size();
-    const auto [numberEnd, error] = std::from_chars(range.data() + kStart.size(), textEnd, last);
+    const auto [numberEnd, error] = std::from_chars(range.data() + kPrefix.size(), textEnd, last);
     const bool isNumber = error == std::errc() && numberEnd == textEnd;
     if (!isNumber || last >= mSentEnd || last + 1 < mNextOffset)
         throw UnrecoverableResponseError("The cloud storage claims to have \"" + range + "\" after " +

@@ -119,8 +119,7 @@ Result KxGoogleAuth::Private::makeForm(qint64 now, QByteArray& form) const
     if (!subject.empty())
         claims.insert(QStringLiteral("sub"), QString::fromStdString(subject));
     QByteArray token;
-    const Result signing =
-        signJsonWebToken(jwtHeader, claims, QByteArray::fromStdString(key.privateKey), token);
+    Result signing = signJsonWebToken(jwtHeader, claims, QByteArray::fromStdString(key.privateKey), token);
     form = bodyPrefix + "&assertion=" + token;
     return signing;
 }

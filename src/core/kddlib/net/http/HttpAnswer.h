@@ -10,14 +10,12 @@ namespace Kdd
 
 struct KxHttpStatus;
 
-/// The codes of answers on which it depends what is done next.
-enum HttpCode : int {
-    kOk = 200,
-    kCreated = 201,
-    kPartialContent = 206,
-    kResumeIncomplete = 308,  // of an upload that is to go on
-    kRangeNotSatisfiable = 416
-};
+// The codes of answers on which it depends what is done next.
+constexpr int kOk = 200;
+constexpr int kCreated = 201;
+constexpr int kPartialContent = 206;
+constexpr int kResumeIncomplete = 308;  // of an upload that is to go on
+constexpr int kRangeNotSatisfiable = 416;
 
 /// The value of a response's header by its name in lower case; null when there is none. Owned by the status.
 const std::string* findHeader(const KxHttpStatus& status, const char* name);
