@@ -1,7 +1,8 @@
 // What servers say in their headers, and the names that callers give to objects.
 
 #include "fuzz/Property.h"
-#include "kddlib/net/cloud/StoragePath.h"
+#include "kddlib/net/cloud/CloudAddress.h"
+#include "kddlib/net/dicom/StoragePath.h"
 #include "kddlib/net/http/ByteRange.h"
 #include "kddlib/net/http/HeaderReceiver.h"
 #include "kddlib/net/http/RequestAddress.h"

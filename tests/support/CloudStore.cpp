@@ -10,15 +10,6 @@ namespace
 
 constexpr int kGranularity = 262144;
 
-/// The value of a header line, which may stand there once only.
-QByteArray header(const QByteArray& headers, const QByteArray& name)
-{
-    const int at = headers.indexOf("\r\n" + name + ": ");
-    const int start = at + name.size() + 4;
-    const bool isOne = at >= 0 && headers.indexOf("\r\n" + name + ":", start) < 0;
-    return isOne ? headers.mid(start, headers.indexOf('\r', start) - start) : QByteArray();
-}
-
 /// As it should be after the bytes so far.
 QByteArray progress(const QByteArray& bytes)
 {
@@ -34,19 +25,6 @@ QByteArray madeOf(const QByteArray& bytes)
 }
 
 }  // namespace
-
-CloudStore::CloudStore()
-    : mServer([this](const QByteArray& request) { return serve(request); })
-{
-    qputenv("KDD_CLOUD_API", mServer.url("").c_str());
-    qputenv("KDD_CLOUD_UPLOAD", mServer.url("").c_str());
-}
-
-CloudStore::~CloudStore()
-{
-    qunsetenv("KDD_CLOUD_API");
-    qunsetenv("KDD_CLOUD_UPLOAD");
-}
 
 QByteArray CloudStore::object(const QByteArray& path) const
 {
@@ -77,19 +55,19 @@ ScriptedServer::Reply CloudStore::serve(const QByteArray& request)
     if (!mFaults.empty())
         mFaults.pop_front();
     const int headersEnd = request.indexOf("\r\n\r\n");
-    const QByteArray headers = request.left(headersEnd + 2);
+    const QByteArray headers = request.left(headersEnd + 4);
     const QByteArray body = request.mid(headersEnd + 4);
     const QByteArray path = request.mid(request.indexOf('/') + 1).split(' ').first();
     const auto session = mSessions.find(path);
-    const bool isForUs = mServer.url("") == "http://" + header(headers, "Host").toStdString() + "/" &&
-                         header(headers, "Cache-Control") == "no-transform";
+    const bool isForUs = mServer.url("") == "http://" + headerOf(headers, "Host").toStdString() + "/" &&
+                         headerOf(headers, "Cache-Control") == "no-transform";
     QByteArray answer;
-    if (!isForUs || header(headers, "Content-Length") != QByteArray::number(body.size()))
+    if (!isForUs || headerOf(headers, "Content-Length") != QByteArray::number(body.size()))
         answer = complain(headers);
     else if (request.startsWith("POST "))
         answer = fault.answer.isEmpty() ? start(path, headers) : QByteArray();
     else if (request.startsWith("PUT ") && session != mSessions.end())
-        answer = takeBody(session->second, header(headers, "Content-Range"), body, fault.takes);
+        answer = takeBody(session->second, headerOf(headers, "Content-Range"), body, fault.takes);
     else
         answer = complain(headers);
     answer = fault.answer.isEmpty() ? answer : fault.answer;
@@ -99,7 +77,7 @@ ScriptedServer::Reply CloudStore::serve(const QByteArray& request)
 
 QByteArray CloudStore::start(const QByteArray& path, const QByteArray& headers)
 {
-    if (header(headers, "x-goog-resumable") != "start")
+    if (headerOf(headers, "x-goog-resumable") != "start")
         return complain(headers);
     const QByteArray address = "upload" + QByteArray::number(int(mSessions.size()));
     mSessions[address].path = path;

@@ -1,6 +1,7 @@
 #pragma once
 
 #include "support/HttpServer.h"
+#include "support/Setting.h"
 
 #include <climits>
 #include <deque>
@@ -12,7 +13,8 @@
 namespace Kdd
 {
 
-/// The cloud storage as an upload meets it: strict about all that is sent to it, and faulty on request.
+/// The cloud storage as an upload meets it: strict about all that is sent to it, and faulty on request. The storage's
+/// hosts are set to this server while it lives.
 class CloudStore
 {
 public:
@@ -23,10 +25,6 @@ public:
         QByteArray answer = {};  ///< in place of its own: code, text, header lines; perhaps a body
         bool resets = false;     ///< no answer at all
     };
-
-    /// The storage's hosts are set to this server while it lives.
-    CloudStore();
-    ~CloudStore();
 
     /// For the next requests, one each; those after them meet no fault.
     void misbehave(const std::vector<Fault>& faults) { mFaults.assign(faults.begin(), faults.end()); }
@@ -57,7 +55,9 @@ private:
     std::deque<Fault> mFaults;
     std::map<QByteArray, Session> mSessions;  // by path of the request
     std::vector<QByteArray> mComplaints;
-    ScriptedServer mServer;
+    ScriptedServer mServer{[this](const QByteArray& request) { return serve(request); }};
+    Setting mApi{"KDD_CLOUD_API", mServer.url("")};
+    Setting mUpload{"KDD_CLOUD_UPLOAD", mServer.url("")};
 };
 
 }  // namespace Kdd

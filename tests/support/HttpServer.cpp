@@ -51,10 +51,7 @@ bool sendAll(int socket, const QByteArray& bytes)
 bool isWhole(const QByteArray& request)
 {
     const int end = request.indexOf("\r\n\r\n");
-    const int length = request.indexOf("\r\nContent-Length: ") + 18;
-    const int bodySize =
-        length < 18 ? 0 : request.mid(length, request.indexOf('\r', length) - length).toInt();
-    return end >= 0 && request.size() - end - 4 >= bodySize;
+    return end >= 0 && request.size() - end - 4 >= headerOf(request, "Content-Length").toInt();
 }
 
 /// Empty when the client goes before it has sent all.
@@ -102,6 +99,20 @@ void NginxServer::addFile(const char* name, const QByteArray& content) const
     QFile file(mFolder.filePath(QStringLiteral("files/") + QString::fromLatin1(name)));
     if (!file.open(QIODevice::WriteOnly) || file.write(content) != content.size())
         throw std::runtime_error("Cannot write " + file.fileName().toStdString());
+}
+
+QByteArray headerOf(const QByteArray& request, const QByteArray& name)
+{
+    const QByteArray headers = request.left(request.indexOf("\r\n\r\n") + 2);
+    const int at = headers.indexOf("\r\n" + name + ": ");
+    const int start = at + name.size() + 4;
+    const bool isOne = at >= 0 && headers.indexOf("\r\n" + name + ":", start) < 0;
+    return isOne ? headers.mid(start, headers.indexOf('\r', start) - start) : QByteArray();
+}
+
+QByteArray httpResponse(const QByteArray& body, const QByteArray& code)
+{
+    return "HTTP/1.1 " + code + "\r\nContent-Length: " + QByteArray::number(body.size()) + "\r\n\r\n" + body;
 }
 
 ScriptedServer::ScriptedServer(Script script)

@@ -36,6 +36,12 @@ private:
     std::string mOrigin;
 };
 
+/// The value of a header line of a request; empty when it is not there, or more than once.
+QByteArray headerOf(const QByteArray& request, const QByteArray& name);
+
+/// A response as it should be.
+QByteArray httpResponse(const QByteArray& body, const QByteArray& code = "200 OK");
+
 /// Does to a client what no proper server would. Each connection is for one request and has a thread.
 class ScriptedServer
 {
@@ -52,6 +58,12 @@ public:
     using Script = std::function<Reply(const QByteArray& request)>;
 
     explicit ScriptedServer(Script script);
+
+    /// Gives the same bytes to everybody.
+    explicit ScriptedServer(const QByteArray& reply)
+        : ScriptedServer([reply](const QByteArray& /*request*/) { return Reply{reply}; })
+    {
+    }
     ~ScriptedServer();
 
     std::string url(const std::string& path) const { return mOrigin + path; }

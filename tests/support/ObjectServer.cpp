@@ -16,11 +16,9 @@ QByteArray someObject(int size)
 
 ScriptedServer::Reply ObjectServer::reply(const QByteArray& request) const
 {
-    const int at = request.indexOf("\r\nRange: bytes=");
-    if (at < 0)
-        return {"HTTP/1.1 200 OK\r\nContent-Length: " + QByteArray::number(mObject.size()) + "\r\n\r\n" +
-                mObject};
-    const QByteArray range = request.mid(at + 15, request.indexOf('\r', at + 2) - at - 15);
+    const QByteArray range = headerOf(request, "Range").mid(int(qstrlen("bytes=")));
+    if (range.isEmpty())
+        return {httpResponse(mObject)};
     Answer answer;
     answer.first = range.split('-').at(0).toInt();
     answer.last = qMin(range.split('-').at(1).toInt(), mObject.size() - 1);

@@ -52,7 +52,7 @@ qint64 readFirstOfObject(const char* url, QByteArray& bytes, std::string& reason
 try {
     KxCurlDownloadStream stream = KxCurlClient::instance().read(url, false);
     const KxHttpStatus& status = stream.httpStatus();
-    reason = status.failed ? status.failure : "HTTP response code " + std::to_string(status.code);
+    reason = status.reason();
     return status.code / 100 == 2 ? stream.read(bytes.data(), bytes.size()).gcount() : -1;
 } catch (const std::exception& fault) {
     reason = fault.what();

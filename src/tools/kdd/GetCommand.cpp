@@ -127,11 +127,8 @@ bool Fetch::beginAnew()
 
 bool Fetch::explain()
 {
-    const KxHttpStatus& status = mStream.httpStatus();
-    if (status.failed)
-        LogFile::errorf("%s cannot be fetched: %s", mRequest.url.constData(), mStream.failure().c_str());
-    else
-        LogFile::errorf("%s cannot be fetched: HTTP response code %d", mRequest.url.constData(), status.code);
+    LogFile::errorf("%s cannot be fetched: %s", mRequest.url.constData(),
+                    mStream.httpStatus().reason().c_str());
     return false;
 }
 

@@ -1,8 +1,8 @@
 #include "CatalogueFixture.h"
+#include "support/Files.h"
 #include "support/HttpServer.h"
 #include "support/ObjectServer.h"
 
-#include <QFile>
 #include <QProcess>
 #include <QStandardPaths>
 
@@ -40,12 +40,6 @@ protected:
     QString url(const char* name) const { return QString::fromStdString(server.url(name)); }
     QString target() const { return mStore.filePath("target"); }
 
-    QByteArray written() const
-    {
-        QFile file(target());
-        return file.open(QIODevice::ReadOnly) ? file.readAll() : QByteArray("(no file)");
-    }
-
     const QByteArray object = someObject(200000);
     NginxServer server;
 };
@@ -53,7 +47,7 @@ protected:
 TEST_F(Examples, FetchAnObject)
 {
     EXPECT_EQ(run(KDD_FETCH_OBJECT, {url("object"), target()}), "200000 of 200000 bytes\n0");
-    EXPECT_EQ(written(), object);
+    EXPECT_EQ(contentOf(target()), object);
     EXPECT_EQ(run(KDD_FETCH_OBJECT, {url("absent"), target()}), "1");
     EXPECT_EQ(run(KDD_FETCH_OBJECT, {QStringLiteral("ftp://a"), target()}), "2");
 }
@@ -81,7 +75,7 @@ TEST_F(Examples, SaveASyncedTagFile)
     ASSERT_TRUE(mCatalogue->setConfig("Storage", "MetaFolder", TagFile::metaFolder()).good());
     const QString database = QString::fromUtf8(mAddress);
     const std::string printed = run(KDD_SYNCED_TAG_FILE, {database, QStringLiteral("1.2"), target()});
-    EXPECT_EQ(printed, std::to_string(written().size()) + " bytes\n0");
+    EXPECT_EQ(printed, std::to_string(contentOf(target()).size()) + " bytes\n0");
     TagFile file;
     ASSERT_TRUE(file.readCacheFile(target(), "1.2", false));
     EXPECT_EQ(file.imagesByUID().keys(), QList<QByteArray>{"2"});

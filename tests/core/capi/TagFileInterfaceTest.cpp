@@ -5,15 +5,18 @@
 #include "platform/base/LogFile.h"
 #include "platform/os/ExclusiveFile.h"
 #include "support/LogCapture.h"
-#include "support/TreeText.h"
+#include "support/Threads.h"
 
 #include <QFile>
 
 #include <gtest/gtest.h>
 #include <syslog.h>
 
+#include <atomic>
 #include <cstdarg>
+#include <functional>
 #include <iostream>
+#include <vector>
 
 /// The system's log of this program, where it can be seen.
 extern "C" void syslog(int priority, const char* format, ...)
@@ -31,35 +34,46 @@ namespace Kdd
 namespace
 {
 
+constexpr int kThreads = 8;
+constexpr int kRounds = 10;
+
 class TagFileInterface : public CatalogueFixture
 {
 protected:
     TagFileInterface() { writeStudy("1.2", {"1", "2", "3"}); }
 
     static QString path() { return TagFile::cacheFilePathForStudy("1.2"); }
+
+    /// Whether the study could be synced; if so the bytes are those of a tag file, else there are none.
+    static bool isSynced(const char* study, const char* user = nullptr)
+    {
+        unsigned int size = 1;
+        const char* data = "";
+        void* const handle = ReadAndSyncTagFileData(study, user, &size, &data);
+        EXPECT_EQ(QByteArray(data, static_cast<int>(size)).startsWith("TaCa"), handle != nullptr);
+        EXPECT_EQ(size == 0 && data == nullptr, handle == nullptr);
+        FreeTagFileData(handle);
+        return handle != nullptr;
+    }
+
+    const char* uids[3] = {"1", "unknown", "3"};
 };
 
 TEST_F(TagFileInterface, ImagesAndSeriesAreRemovedAndWithTheLastTheFile)
 {
-    const char* uids[] = {"1", "unknown", "3"};
     EXPECT_TRUE(DeleteImagesInTagFile("1.2", 0, nullptr));
-    EXPECT_EQ(imagesInFile("1.2"), (QList<QByteArray>{"1", "2", "3"}));
     EXPECT_TRUE(DeleteImagesInTagFile("1.2", 3, uids));
     EXPECT_EQ(imagesInFile("1.2"), QList<QByteArray>{"2"});
     const char* series[] = {"1.2.3"};
     EXPECT_TRUE(DeleteSeriesInTagFile("1.2", 1, series));
     EXPECT_FALSE(QFile::exists(path()));
-    writeStudy("1.2", {"1"});
-    EXPECT_TRUE(DeleteImagesInTagFile("1.2", 1, uids));
-    EXPECT_FALSE(QFile::exists(path()));
 }
 
 TEST_F(TagFileInterface, WhatIsNotThereNeedsNoDeletionAndNoLine)
 {
-    const char* uids[] = {"1"};
-    ASSERT_TRUE(DeleteTagFile("1.2"));
-    EXPECT_FALSE(QFile::exists(path()));
     const LogCapture log;
+    EXPECT_TRUE(DeleteTagFile("1.2"));
+    EXPECT_FALSE(QFile::exists(path()));
     EXPECT_TRUE(DeleteTagFile("1.2"));
     EXPECT_TRUE(DeleteImagesInTagFile("1.2", 1, uids));
     EXPECT_TRUE(DeleteSeriesInTagFile("1.2", 1, uids));
@@ -70,7 +84,6 @@ TEST_F(TagFileInterface, AFileThatOthersHoldStaysAndALineSaysSo)
 {
     QFile held;
     ASSERT_TRUE(openLockedFile(held, path(), FileLock::Exclusive, IfAbsent::Fail, {1, 0}));
-    const char* uids[] = {"1"};
     const LogCapture log;
     EXPECT_FALSE(DeleteImagesInTagFile("1.2", 1, uids));
     EXPECT_EQ(log.count("Could not remove images from the tag file of study 1.2: "), 1);
@@ -82,7 +95,7 @@ TEST_F(TagFileInterface, AFileThatOthersHoldStaysAndALineSaysSo)
 
 TEST(TagFileRemoval, IsTriedSixTimes)
 {
-    for (int failures = 0; failures <= 6; ++failures) {
+    for (const int failures : {0, 1, 5, 6}) {
         const LogCapture log;
         int attempts = 0;
         const bool isGone = removeTagFile(QStringLiteral("f"),
@@ -101,25 +114,16 @@ TEST_F(TagFileInterface, AStudyOfBothTheDatabaseAndATagFileIsSynced)
     writeStudy("1.3", {"1"});
     registerImages("1.2", {"1", "3"});
     registerImages("5.5", {"1"});
-    for (const std::string study : {"1.2", "1.3", "5.5"}) {
-        const bool isSynced = study == "1.2";
-        unsigned int size = 1;
-        const char* data = "";
-        const LogCapture log;
-        void* const handle = ReadAndSyncTagFileData(study.c_str(), isSynced ? "user" : nullptr, &size, &data);
-        EXPECT_EQ(handle != nullptr, isSynced);
-        EXPECT_EQ(QByteArray(data, static_cast<int>(size)).startsWith("TaCa"), isSynced);
-        EXPECT_EQ(size == 0 && data == nullptr, !isSynced);
-        EXPECT_EQ(log.count("Loaded and synced tag file for study 1.2 (" + std::to_string(size) + " bytes)"),
-                  isSynced);
-        FreeTagFileData(handle);
-    }
+    const LogCapture log;
+    EXPECT_TRUE(isSynced("1.2", "user"));
+    EXPECT_FALSE(isSynced("1.3") || isSynced("5.5"));
+    EXPECT_EQ(log.count("Loaded and synced tag file for study 1.2 ("), 1);
     EXPECT_EQ(imagesInFile("1.2").size(), 3) << "the file stays as it is";
 }
 
 TEST_F(TagFileInterface, NullsAndNegativeCountsAreRefusedWithALineEach)
 {
-    const char* uids[] = {"1", nullptr};
+    uids[1] = nullptr;
     unsigned int size = 1;
     const char* data = "";
     const LogCapture log;
@@ -130,13 +134,47 @@ TEST_F(TagFileInterface, NullsAndNegativeCountsAreRefusedWithALineEach)
         EXPECT_FALSE(remove("1.2", 1, nullptr));
         EXPECT_FALSE(remove("1.2", 2, uids));
     }
-    EXPECT_EQ(ReadAndSyncTagFileData(nullptr, nullptr, &size, &data), nullptr);
-    EXPECT_TRUE(size == 0 && data == nullptr);
+    EXPECT_FALSE(isSynced(nullptr));
     EXPECT_EQ(ReadAndSyncTagFileData("1.2", nullptr, nullptr, &data), nullptr);
     EXPECT_EQ(ReadAndSyncTagFileData("1.2", nullptr, &size, nullptr), nullptr);
     EXPECT_EQ(log.count(" must not be "), 12);
     EXPECT_EQ(log.lines().size(), 12U);
     EXPECT_EQ(imagesInFile("1.2").size(), 3);
+}
+
+/// How often the work answered true, done on all threads at once and on each again and again.
+int successes(const std::function<bool(int thread, int round)>& work)
+{
+    std::atomic<int> done = 0;
+    onThreads(kThreads, [&](int thread) {
+        for (int round = 0; round < kRounds; ++round)
+            done += work(thread, round) ? 1 : 0;
+    });
+    return done;
+}
+
+TEST_F(TagFileInterface, ThreadsWaitForEachOtherAndLoseNothing)
+{
+    const auto image = [](int thread, int round) { return QByteArray::number(thread * 100 + round); };
+    std::vector<QByteArray> images = {"kept"};
+    for (int i = 0; i < kThreads * kRounds; ++i)
+        images.push_back(image(i / kRounds, i % kRounds));
+    writeStudy("1.2", images);
+    registerImages("1.2", {"kept"});
+    // Whoever finds the file held for longer than it waits is told so.
+    const LogCapture log;
+    const int removals = successes([&](int thread, int round) {
+        const QByteArray uid = image(thread, round);
+        const char* own[] = {uid.constData()};
+        return DeleteImagesInTagFile("1.2", 1, own);
+    });
+    const int refused = log.count("Could not remove images from the tag file of study 1.2");
+    EXPECT_EQ(removals, kThreads * kRounds - refused);
+    EXPECT_EQ(imagesInFile("1.2").size(), 1 + refused);
+    EXPECT_EQ(successes([](int, int) { return isSynced("1.2"); }), kThreads * kRounds);
+    const int deletions = successes([](int, int) { return DeleteTagFile("1.2"); });
+    EXPECT_EQ(deletions, kThreads * kRounds - log.count("could not be deleted"));
+    EXPECT_FALSE(QFile::exists(path()));
 }
 
 /// In a process of its own, for the log is the process's.
@@ -153,14 +191,13 @@ TEST_F(TagFileInterface, NullsAndNegativeCountsAreRefusedWithALineEach)
 TEST(LoggingInterface, DebugGoesToStandardErrorAndAllElseToTheSystemsLog)
 {
     testing::GTEST_FLAG(death_test_style) = "threadsafe";
-    const std::pair<short, const char*> cases[] = {
-        {0, "<15>\\[TagMerge\\] done\n<15>\\[TagMerge\\] here\n"},
-        {1, "[^<]*Configure logging: debug=1 timings=0\n[^<]*Could not open /absent: [^<]*\\[TagMerge\\] "
-            "done\nhere\n"},
-        {2, "<15>\\[TagMerge\\] done\n<15>\\[TagMerge\\] here\n"},
-        {3, "[^<]*Configure logging: debug=1 timings=1\n[^<]*Could not open /absent: [^<]*\\[TagMerge\\] "
-            "done\nhere\n"},
+    const std::string toSystem = "<15>\\[TagMerge\\] done\n<15>\\[TagMerge\\] here\n";
+    const auto toError = [](const char* timings) {
+        return std::string("[^<]*Configure logging: debug=1 timings=") + timings +
+               "\n[^<]*Could not open /absent: [^<]*\\[TagMerge\\] done\nhere\n";
     };
+    const std::pair<short, std::string> cases[] = {
+        {0, toSystem}, {1, toError("0")}, {2, toSystem}, {3, toError("1")}};
     for (const auto& [flags, written] : cases)
         EXPECT_EXIT(configureAndLog(flags), testing::ExitedWithCode(0), testing::MatchesRegex(written));
 }

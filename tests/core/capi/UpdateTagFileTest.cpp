@@ -3,6 +3,7 @@
 #include "platform/filecache/ExFileCache.h"
 #include "platform/os/ExclusiveFile.h"
 #include "support/LogCapture.h"
+#include "support/Setting.h"
 
 #include <QFile>
 
@@ -27,12 +28,10 @@ protected:
     UpdateTagFileTest()
     {
         writeStudy("1.2", {"1", "2"});
-        qputenv("KDD_FILE_CACHE", mStore.filePath("cache").toLocal8Bit());
         EXPECT_TRUE(cache.init().good());
         for (const char* name : {"1.2/Level0", "1.2/Level1", "other/Level1"})
             EXPECT_TRUE(cache.storeBuffer(name, "x").good());
     }
-    ~UpdateTagFileTest() override { qunsetenv("KDD_FILE_CACHE"); }
 
     static QByteArray textOf(const char* image, const DcmTagKey& key)
     {
@@ -49,9 +48,12 @@ protected:
         return cache.readBuffer(name, bytes);
     }
 
+    const Setting folder{"KDD_FILE_CACHE", mStore.filePath("cache").toStdString()};
     ExFileCache cache;
     const char* images[2] = {"1", "unknown"};
     const char* entries[2] = {"1.2/Level0", "1.2/Level1"};
+    const wchar_t* wideImages[2] = {L"2", nullptr};
+    const wchar_t* wideEntries[1] = {L"1.2/Level1"};
 };
 
 TEST_F(UpdateTagFileTest, CorrectsTheImagesNamedAndDropsWhatWasComputedFromThem)
@@ -64,29 +66,16 @@ TEST_F(UpdateTagFileTest, CorrectsTheImagesNamedAndDropsWhatWasComputedFromThem)
     EXPECT_TRUE(UpdateTagFile(kJob, "1.2", 2, images, nullptr)) << "without cache entries";
 }
 
-TEST_F(UpdateTagFileTest, TakesWideTexts)
+TEST_F(UpdateTagFileTest, TakesWideTextsWhateverEncodingTheyDeclare)
 {
-    const wchar_t* wideImages[] = {L"2"};
-    const wchar_t* wideEntries[] = {L"1.2/Level1"};
-    ASSERT_TRUE(UpdateTagFileW(kWideJob, L"1.2", 1, wideImages, wideEntries));
-    EXPECT_EQ(textOf("2", DCM_SeriesDescription), "caf\xe9");
-    EXPECT_FALSE(isCached("1.2/Level1"));
-    EXPECT_TRUE(UpdateTagFileW(kWideJob, L"1.2", 1, wideImages, nullptr));
-}
-
-TEST_F(UpdateTagFileTest, AWideTextIsItsTextWhateverEncodingItDeclares)
-{
-    const wchar_t* wideImages[] = {L"2"};
-    const std::wstring job(kWideJob);
-    for (const wchar_t* declared :
-         {L"<?xml version='1.0' encoding='ISO-8859-1'?>", L"<?xml version='1.0' encoding='utf-16'?>",
+    for (const std::wstring declared :
+         {L"", L"<?xml version='1.0' encoding='ISO-8859-1'?>", L"<?xml version='1.0' encoding='utf-16'?>",
           L"\ufeff<?xml version='1.0'?>"}) {
-        const char* all[] = {"2"};
-        ASSERT_TRUE(
-            UpdateTagFile("<Tag Group='8' Element='103E'><Value>x</Value></Tag>", "1.2", 1, all, nullptr));
-        EXPECT_TRUE(UpdateTagFileW((declared + job).c_str(), L"1.2", 1, wideImages, nullptr));
+        writeStudy("1.2", {"1", "2"});
+        EXPECT_TRUE(UpdateTagFileW((declared + kWideJob).c_str(), L"1.2", 1, wideImages, wideEntries));
         EXPECT_EQ(textOf("2", DCM_SeriesDescription), "caf\xe9");
     }
+    EXPECT_FALSE(isCached("1.2/Level1"));
     const LogCapture log;
     EXPECT_FALSE(UpdateTagFileW(L"<Login>\xd800</Login>", L"1.2", 1, wideImages, nullptr));
     EXPECT_EQ(log.count("half a character"), 1);
@@ -107,15 +96,14 @@ TEST_F(UpdateTagFileTest, SaysInALineWhatWentWrong)
 
 TEST_F(UpdateTagFileTest, RefusesNullsAndNegativeCountsWithALineEach)
 {
-    const char* withNull[] = {"1", nullptr};
-    const wchar_t* wideWithNull[] = {L"1", nullptr};
+    entries[1] = nullptr;
     const LogCapture log;
-    EXPECT_FALSE(UpdateTagFile(kJob, "1.2", 2, images, withNull));
-    EXPECT_FALSE(UpdateTagFileW(nullptr, L"1.2", 2, wideWithNull, nullptr));
-    EXPECT_FALSE(UpdateTagFileW(kWideJob, nullptr, 2, wideWithNull, nullptr));
-    EXPECT_FALSE(UpdateTagFileW(kWideJob, L"1.2", -1, wideWithNull, nullptr));
+    EXPECT_FALSE(UpdateTagFile(kJob, "1.2", 2, images, entries));
+    EXPECT_FALSE(UpdateTagFileW(nullptr, L"1.2", 2, wideImages, nullptr));
+    EXPECT_FALSE(UpdateTagFileW(kWideJob, nullptr, 2, wideImages, nullptr));
+    EXPECT_FALSE(UpdateTagFileW(kWideJob, L"1.2", -1, wideImages, nullptr));
     EXPECT_FALSE(UpdateTagFileW(kWideJob, L"1.2", 2, nullptr, nullptr));
-    EXPECT_FALSE(UpdateTagFileW(kWideJob, L"1.2", 2, wideWithNull, nullptr));
+    EXPECT_FALSE(UpdateTagFileW(kWideJob, L"1.2", 2, wideImages, nullptr));
     EXPECT_EQ(log.count(" must not be "), 6);
 }
 

@@ -3,10 +3,10 @@
 #include "kddlib/net/dicom/DicomFileReader.h"
 #include "platform/volume/FragmentReader.h"
 #include "support/DatasetBuilder.h"
+#include "support/Files.h"
 #include "support/LogCapture.h"
 #include "support/RealFiles.h"
 
-#include <QFile>
 #include <QTemporaryDir>
 #include <QtEndian>
 
@@ -25,13 +25,6 @@ QByteArray item(const QByteArray& value)
     QByteArray bytes("\xfe\xff\x00\xe0????", 8);
     qToLittleEndian<quint32>(static_cast<quint32>(value.size()), bytes.data() + 4);
     return bytes + value;
-}
-
-QByteArray contentOf(const QString& path)
-{
-    QFile file(path);
-    EXPECT_TRUE(file.open(QIODevice::ReadOnly));
-    return file.readAll();
 }
 
 /// DICOM files whose pixel data stand as they are given here.
@@ -117,8 +110,7 @@ TEST_F(VideoInterface, NoPartOfAFileIsMistakenForItsVideo)
     for (int size = 0; size < whole.size() - 16; ++size) {
         ASSERT_TRUE(QFile::resize(path(), size));
         ASSERT_EQ(told().first, KDD_NOT_READ) << size;
-        QFile again(path());
-        ASSERT_TRUE(again.open(QIODevice::WriteOnly) && again.write(whole) == whole.size());
+        writeFile(path(), whole);
     }
 }
 
@@ -157,12 +149,11 @@ TEST(FragmentLocation, IsThatOfEveryRealFile)
             if (readDicomFile(path.toLocal8Bit().constData(), file).bad())
                 continue;
             const bool isLocated = locateFirstFragment(path.toLocal8Bit().constData(), file, location);
-            const QByteArray fragment = firstFragment(file);
-            EXPECT_EQ(isLocated, !fragment.isEmpty()) << path.toStdString();
-            compressed += isLocated;
-            EXPECT_TRUE(!isLocated || contentOf(path).mid(static_cast<int>(location.offset),
-                                                          static_cast<int>(location.length)) == fragment)
+            const QByteArray bytes = isLocated ? contentOf(path) : QByteArray();
+            EXPECT_EQ(bytes.mid(static_cast<int>(location.offset), static_cast<int>(location.length)),
+                      firstFragment(file))
                 << path.toStdString();
+            compressed += isLocated;
         }
     }
     EXPECT_GT(compressed, 50);

@@ -6,6 +6,8 @@
 #include "kddlib/net/http/KxCurlRequest.h"
 #include "support/HttpServer.h"
 #include "support/LogCapture.h"
+#include "support/Setting.h"
+#include "support/Threads.h"
 
 #include <QJsonDocument>
 #include <QJsonObject>
@@ -26,21 +28,25 @@ namespace
 class Client : public testing::Test
 {
 protected:
-    ~Client() override
-    {
-        client.setSessionID({});
-        qunsetenv("KDD_CLOUD_API");
-    }
+    ~Client() override { client.setSessionID({}); }
 
     std::string lastRequest() const { return server.requests().back().toStdString(); }
 
     KxCurlClient& client = KxCurlClient::instance();
     KxHttpStatus status;
-    ScriptedServer server{[](const QByteArray&) -> ScriptedServer::Reply {
-        return {
-            "HTTP/1.1 103 Early Hints\r\n\r\nHTTP/1.1 200 OK\r\nX-Two:  b \r\nX-TWO:c: d\r\n\r\n{\"a\": 1}"};
-    }};
+    ScriptedServer server{
+        "HTTP/1.1 103 Early Hints\r\n\r\nHTTP/1.1 200 OK\r\nX-Two:  b \r\nX-TWO:c: d\r\n\r\n{\"a\": 1}"};
+    Setting cloud{"KDD_CLOUD_API", server.url("")};
 };
+
+TEST(ClientNames, AreToldFromFilesByTheirFirstLettersAndLeadToTheWebService)
+{
+    for (const char* file : {"", "h", "ftp://a", static_cast<const char*>(nullptr)})
+        EXPECT_FALSE(KxCurlClient::isUrl(file));
+    EXPECT_TRUE(KxCurlClient::isUrl("gsx") && KxCurlClient::isUrl("https://a"));
+    const Setting host("KDD_WEB_HOST", "pacs:8443");
+    EXPECT_EQ(KxCurlClient::url("GetStudy?x=1"), "https://pacs:8443/quil/Browser.svc/GetStudy?x=1");
+}
 
 TEST_F(Client, ReadsABodyOfAnyLengthAndKeepsTheConnection)
 {
@@ -88,51 +94,67 @@ TEST_F(Client, PostsBytesWithTheirTypeAndReadsTheAnswer)
     EXPECT_THAT(lastRequest(), EndsWith("\r\n\r\n{\n    \"k\": 2\n}\n"));
 }
 
-TEST_F(Client, RefusesAHeaderLineThatWouldBeTwo)
-{
-    EXPECT_THROW(client.postBytes(server.url("p"), "b", "a\r\nX-Admin: 1", status), std::runtime_error);
-    EXPECT_TRUE(server.requests().empty());
-}
-
-TEST_F(Client, DeletesCloudObjectsAndNothingElse)
+TEST_F(Client, SendsNothingThatIsNotWhatItSeems)
 {
     const LogCapture log;  // of the missing credentials
-    qputenv("KDD_CLOUD_API", server.url("").c_str());
-    client.setSessionID("12");
-    EXPECT_TRUE(client.deleteObject(server.url("x")));
-    EXPECT_TRUE(server.requests().empty());
-    EXPECT_TRUE(client.deleteObject("gs://b/x/y"));
-    EXPECT_THAT(lastRequest(), StartsWith("DELETE /b/x%2Fy HTTP/1.1\r\nHost: 127.0.0.1:"));
-    EXPECT_THAT(lastRequest(), HasSubstr("\r\nCache-Control: no-transform\r\n"));
-    EXPECT_THAT(lastRequest(), HasSubstr("\r\nUser-Agent: Korvex kddlib "));
-    qputenv("KDD_CLOUD_API", "http://127.0.0.1:1/");
-    EXPECT_THROW(client.deleteObject("gs://b/x"), CurlError);
-}
-
-TEST_F(Client, SendsNothingToAnAddressThatIsNoObjectsOwn)
-{
-    const LogCapture log;
-    qputenv("KDD_CLOUD_API", server.url("").c_str());
-    qputenv("KDD_CLOUD_UPLOAD", server.url("").c_str());
-    for (const char* address : {"gs://b/o?generation=5", "gs://b", "gs://b/..", "gs://b/5%", "gs://b#/o"}) {
-        EXPECT_THROW(client.deleteObject(address), std::invalid_argument) << address;
-        EXPECT_THROW(client.write(address), std::invalid_argument) << address;
-    }
-    EXPECT_TRUE(server.requests().empty());
-    EXPECT_TRUE(client.deleteObject("gs://b/scan#1 a.dcm"));
-    EXPECT_THAT(lastRequest(), StartsWith("DELETE /b/scan%231%20a.dcm HTTP/1.1\r\n"));
-    qunsetenv("KDD_CLOUD_UPLOAD");
+    const Setting upload("KDD_CLOUD_UPLOAD", server.url(""));
+    EXPECT_THROW(client.postBytes(server.url("p"), "b", "a\r\nX-Admin: 1", status), std::runtime_error);
     EXPECT_THROW(client.readBytes(server.url(std::string("a\0b", 3)), status), CurlError);
+    EXPECT_THROW(client.deleteObject("gs://b/o?generation=5"), std::invalid_argument);
+    EXPECT_THROW(client.write("gs://b/.."), std::invalid_argument);
+    EXPECT_TRUE(client.deleteObject(server.url("x")));
+    EXPECT_EQ(client.readBytes("file:///etc/hostname", status), QByteArray());
+    EXPECT_TRUE(status.failed);
+    EXPECT_TRUE(server.requests().empty());
     client.readBytes(server.url("a/../b"), status);
     EXPECT_THAT(lastRequest(), StartsWith("GET /a/../b HTTP/1.1\r\n"));
 }
 
-TEST_F(Client, TellsWhyATransferFailed)
+TEST_F(Client, DeletesCloudObjects)
 {
     const LogCapture log;
+    client.setSessionID("12");
+    EXPECT_TRUE(client.deleteObject("gs://b/x/y#1"));
+    EXPECT_THAT(lastRequest(), StartsWith("DELETE /b/x%2Fy%231 HTTP/1.1\r\nHost: 127.0.0.1:"));
+    EXPECT_THAT(lastRequest(), HasSubstr("\r\nCache-Control: no-transform\r\n"));
+    EXPECT_THAT(lastRequest(), HasSubstr("\r\nUser-Agent: Korvex kddlib "));
+    cloud.set("http://127.0.0.1:1/");
+    EXPECT_THROW(client.deleteObject("gs://b/x"), CurlError);
+}
+
+struct ServerFault
+{
+    const char* name;
+    ScriptedServer::Reply reply;
+    const char* body;
+    const char* reason;
+};
+
+const ServerFault kServerFaults[] = {
+    {"BodyEndsEarly", {"HTTP/1.1 200 OK\r\nContent-Length: 9\r\n\r\nfour"}, "four", "5 bytes remaining"},
+    {"ResetInTheBody", {"HTTP/1.1 200 OK\r\nContent-Length: 9\r\n\r\nfour", {}, true}, "four", "transfer: "},
+    {"ChunkEndsEarly",
+     {"HTTP/1.1 200 OK\r\nTransfer-Encoding: chunked\r\n\r\n9\r\nfour"},
+     "four",
+     "outstanding"},
+    {"LengthIsNoNumber", {"HTTP/1.1 200 OK\r\nContent-Length: nine\r\n\r\nfour"}, "", "Content-Length"},
+    {"NothingAtAll", {""}, "", "Empty reply"},
+    {"OtherProtocol", {"220 mail.example ESMTP\r\n"}, "", "HTTP/0.9"},
+    {"HeaderLineWithoutEnd", {"HTTP/1.1 200 OK\r\nX: ", QByteArray(9999, 'x')}, "", "Out of memory"},
+    {"HeadersWithoutEnd", {"HTTP/1.1 200 OK\r\n", QByteArray(99, 'x') + ": y\r\n"}, "", "Too large"},
+};
+
+TEST_F(Client, FailsWhereATransferBreaksOffAndKeepsWhatArrived)
+{
+    for (const ServerFault& fault : kServerFaults) {
+        const LogCapture log;
+        const ScriptedServer faulty([&](const QByteArray&) { return fault.reply; });
+        EXPECT_EQ(client.readBytes(faulty.url("x"), status), fault.body) << fault.name;
+        EXPECT_TRUE(status.failed) << fault.name;
+        EXPECT_EQ(log.count(fault.reason), 1) << fault.name << testing::PrintToString(log.lines());
+    }
     client.readBytes("http://127.0.0.1:1/x", status);
-    EXPECT_TRUE(status.failed);
-    EXPECT_THAT(status.failure, HasSubstr("Failed to connect"));
+    EXPECT_THAT(status.reason(), HasSubstr("Failed to connect"));
 }
 
 QByteArray redirectTo(const std::string& url)
@@ -181,17 +203,13 @@ TEST_P(ManyThreads, GetEachItsOwnAnswer)
     const NginxServer nginx(NginxServer::Scheme::Http, "location / { return 200 $uri; }");
     const CurlShare share(GetParam());
     const auto factory = std::make_shared<KxCurlHandleFactory>(4);  // too few to keep all handles
-    std::vector<std::thread> threads;
-    for (int i = 0; i < 8; ++i)
-        threads.emplace_back([&, path = "/" + std::to_string(i)] {
-            for (int round = 0; round < 25; ++round) {
-                KxCurlRequest request(factory, share, nginx.url(path.substr(1)), "GET");
-                request.perform();
-                EXPECT_EQ(request.response().toStdString(), path);
-            }
-        });
-    for (std::thread& thread : threads)
-        thread.join();
+    onThreads(8, [&](int thread) {
+        for (int round = 0; round < 25; ++round) {
+            KxCurlRequest request(factory, share, nginx.url(std::to_string(thread)), "GET");
+            request.perform();
+            EXPECT_EQ(request.response(), '/' + QByteArray::number(thread));
+        }
+    });
 }
 
 TEST_F(Client, NeedsNoMoreConnectionsThanThreads)
@@ -200,18 +218,14 @@ TEST_F(Client, NeedsNoMoreConnectionsThanThreads)
     const NginxServer nginx(NginxServer::Scheme::Http, "location / { return 200 $connection; }");
     std::mutex mutex;
     std::set<QByteArray> connections;
-    std::vector<std::thread> threads;
-    for (int i = 0; i < kThreads; ++i)
-        threads.emplace_back([&] {
-            for (int round = 0; round < 30; ++round) {
-                KxHttpStatus own;
-                const QByteArray connection = client.readBytes(nginx.url("x"), own);
-                const std::lock_guard lock(mutex);
-                connections.insert(connection);
-            }
-        });
-    for (std::thread& thread : threads)
-        thread.join();
+    onThreads(kThreads, [&](int) {
+        for (int round = 0; round < 30; ++round) {
+            KxHttpStatus own;
+            const QByteArray connection = client.readBytes(nginx.url("x"), own);
+            const std::lock_guard lock(mutex);
+            connections.insert(connection);
+        }
+    });
     EXPECT_LE(connections.size(), std::size_t(kThreads));
 }
 
@@ -220,15 +234,15 @@ TEST_F(Client, DeletesOverOneConnection)
     const LogCapture log;
     const NginxServer nginx(NginxServer::Scheme::Http, "location = /accepted { stub_status; }"
                                                        "location /b/ { return 204; }");
-    qputenv("KDD_CLOUD_API", nginx.url("").c_str());
+    cloud.set(nginx.url(""));
     const auto accepted = [&] {
-        return client.readBytes(nginx.url("accepted"), status).split('\n').value(2);
+        const QByteArray counts = client.readBytes(nginx.url("accepted"), status).split('\n').value(2);
+        return counts.trimmed().split(' ').first().toInt();
     };
-    const QByteArray before = accepted();
+    const int before = accepted();
     for (int i = 0; i < 5; ++i)
         EXPECT_TRUE(client.deleteObject("gs://b/x"));
-    EXPECT_EQ(accepted().trimmed().split(' ').first().toInt(),
-              before.trimmed().split(' ').first().toInt() + 1);
+    EXPECT_EQ(accepted(), before + 1);
 }
 
 INSTANTIATE_TEST_SUITE_P(Net, ManyThreads,

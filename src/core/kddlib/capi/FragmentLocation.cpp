@@ -75,6 +75,7 @@ bool locateFirstFragment(const char* path, DcmFileFormat& file, FragmentLocation
     const qint64 length = lengthOf(*sequence, 1);
     const qint64 table = positionOfPixelData(path);
     const qint64 fragment = table + kItemHeaderSize + tableLength;
+    // Looked at in the file itself: the parser's lengths may be those of a file that was replaced since.
     RandomAccessFile bytes;
     if (bytes.open(path) != 0 || !hasItem(bytes, table, tableLength) || !hasItem(bytes, fragment, length))
         return false;

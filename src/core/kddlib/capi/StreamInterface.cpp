@@ -23,12 +23,9 @@ struct UserInfo
 bool isOk(KxCurlDownloadStream& stream, const char* url)
 {
     const KxHttpStatus& status = stream.httpStatus();
-    if (status.ok())
-        return true;
-    const std::string reason =
-        status.failed ? stream.failure() : "HTTP response code " + std::to_string(status.code);
-    LogFile::errorf("Reading %s failed: %s", url, reason.c_str());
-    return false;
+    if (!status.ok())
+        LogFile::errorf("Reading %s failed: %s", url, status.reason().c_str());
+    return status.ok();
 }
 
 template <typename Opening>
@@ -130,6 +127,7 @@ int ReadDicomFromUrl(const char* url, void* userInfo, uint32_t* length, const ch
         const std::streamsize count = readBlock(info, url != nullptr ? url : "the object");
         const bool isOver = count < 0 || info.stream.eof();
         if (isOver)
+            // Frees the connection: who has got the last block may keep the user info for long.
             info.stream.close();
         if (count < 0)
             return KDD_NOT_READ;

@@ -30,6 +30,7 @@ void configureLogging(int flags, const char* databaseServer)
     LogFile::setLevel(LogFile::Level::Everything);
     LogFile::setDebugLogging(isDebug);
     LogFile::setCallback(isDebug ? LogFile::Callback() : LogFile::Callback(writeToSystemLog));
+    // All of them anew, so that a call leaves nothing of an earlier one.
     TagFile::setDebugOptions(hasTimings ? TagFile::kTimings : 0);
     if (isDebug)
         LogFile::printf("Configure logging: debug=%d timings=%d", 1, hasTimings ? 1 : 0);
@@ -63,6 +64,7 @@ std::unique_ptr<QByteArray> readAndSync(const char* studyUID, const char* user)
     TagFile file;
     if (!file.readAndSync(studyUID, user))
         return nullptr;
+    // On the heap, because the caller's pointer is to its bytes, and the handle is the array itself.
     auto bytes = std::make_unique<QByteArray>();
     QDataStream out(bytes.get(), QIODevice::WriteOnly);
     if (!file.writeCacheFile(out)) {

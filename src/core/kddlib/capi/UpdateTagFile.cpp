@@ -34,6 +34,7 @@ bool fail(const char* what, const QString& message)
 void removeStaleEntries(const QList<QByteArray>& names)
 {
     ExFileCache cache;
+    // No cache, no stale entries: the correction itself is done.
     if (cache.init().bad())
         return;
     for (const QByteArray& name : names) {

@@ -3,6 +3,7 @@
 #include "kddlib/capi/kddstream.h"
 #include "kddlib/net/dicom/KxDcmFileLoader.h"
 #include "platform/base/LogFile.h"
+#include "platform/base/Result.h"
 
 #include <QByteArray>
 #include <QList>
@@ -45,22 +46,22 @@ int videoSyntaxOf(DcmFileFormat& file)
     return number >= kFirstVideoSyntax && number <= kLastVideoSyntax ? number : 0;
 }
 
-/// Why not, in words; empty on success.
-QByteArray readVideo(const char* path, VideoMetaInfo& info)
+Result readVideo(const char* path, VideoMetaInfo& info)
 {
     DcmFileFormat file;
     const OFCondition condition = loadDicomFile(path, file);
     if (condition.bad())
-        return condition.text();
+        return Result::failure(QString::fromUtf8(condition.text()));
     OFString uid;
     file.getDataset()->findAndGetOFString(DCM_SOPInstanceUID, uid);
     if (uid.size() >= KDD_UID_SIZE)
-        return QByteArray("SOP Instance UID is longer than 64 characters: ") + uid.c_str();
+        return Result::failure(QStringLiteral("SOP Instance UID is longer than 64 characters: ") +
+                               QString::fromUtf8(uid.c_str()));
     info.sopInstanceUID = uid.c_str();
     file.getDataset()->findAndGetSint32(DCM_CineRate, info.cineRate);
     info.transferSyntax = videoSyntaxOf(file);
     if (info.transferSyntax == 0 || !locateFirstFragment(path, file, info.location))
-        return "it holds no video";
+        return Result::failure(QStringLiteral("it holds no video"));
     return {};
 }
 
@@ -82,8 +83,8 @@ int GetVideoMetaInfo(const char* path, char* sopInstanceUID, int32_t* cineRate, 
         VideoMetaInfo info;
         if (!isGiven(function, "the path", path))
             return KDD_NOT_READ;
-        if (const QByteArray reason = readVideo(path, info); !reason.isEmpty()) {
-            LogFile::errorf("Could not find the video of %s: %s", path, reason.constData());
+        if (const Result result = readVideo(path, info); result.bad()) {
+            LogFile::errorf("Could not find the video of %s: %s", path, qUtf8Printable(result.text()));
             return KDD_NOT_READ;
         }
         std::memcpy(sopInstanceUID, info.sopInstanceUID.constData(),

@@ -1,6 +1,7 @@
 #include "kddlib/net/KxCurlClient.h"
 
-#include "kddlib/Limits.h"
+#include "kddlib/net/ClientSettings.h"
+#include "kddlib/net/cloud/CloudAddress.h"
 #include "kddlib/net/cloud/KxCurlUploadStream.h"
 #include "kddlib/net/cloud/KxCurlUploadStreambuf.h"
 #include "kddlib/net/cloud/KxGoogleAuth.h"
@@ -8,10 +9,11 @@
 #include "kddlib/net/http/KxCurlDownloadStream.h"
 #include "kddlib/net/http/KxCurlDownloadStreambuf.h"
 #include "kddlib/net/http/KxCurlRequest.h"
-#include "kddlib/net/http/PreparedRequest.h"
 #include "kddlib/net/http/Redirects.h"
 #include "kddlib/net/http/RequestAddress.h"
 #include "kddlib/net/http/TlsLocks.h"
+#include "kddlib/net/http/WholeBody.h"
+#include "platform/base/Result.h"
 #include "platform/resources/ExResource.h"
 
 #include <QJsonDocument>
@@ -20,6 +22,7 @@
 #include <algorithm>
 #include <mutex>
 #include <stdexcept>
+#include <string_view>
 #include <thread>
 #include <utility>
 
@@ -28,12 +31,13 @@ namespace Kdd
 namespace
 {
 
+/// More threads than that at once only find fewer connections open.
 constexpr std::size_t kIdleHandles = 48;
-constexpr int kFirstReadSize = 128 * 1024;  // [bytes]
 
 /// Curl and the library below it, once for the process.
 void setUpCurl()
 {
+    // Once and before any handle, for other threads must not be in the libraries meanwhile.
     static std::once_flag once;
     std::call_once(once, [] {
         if (const CURLcode code = curl_global_init(CURL_GLOBAL_ALL))
@@ -51,49 +55,15 @@ CurlShare::Connections connectionsOfSite()
 
 void requireCloudObject(const std::string& address)
 {
-    if (const std::string reason = whyNoCloudObject(address); !reason.empty())
-        throw std::invalid_argument(address + ' ' + reason);
-}
-
-/// The rest of a stream of which nobody says how long it is, up to the bound of a response.
-QByteArray readUntilEnd(std::istream& stream)
-{
-    QByteArray bytes(kFirstReadSize, Qt::Uninitialized);
-    qint64 got = 0;
-    while (got < kMaxResponseSize && stream.read(bytes.data() + got, bytes.size() - got).gcount() > 0) {
-        got += stream.gcount();
-        if (got > bytes.size() / 2)
-            bytes.resize(static_cast<int>(qMin(2 * qint64(bytes.size()), kMaxResponseSize)));
-    }
-    bytes.resize(static_cast<int>(got));
-    return bytes;
-}
-
-/// The whole body, and what became of the transfer.
-QByteArray readWhole(KxCurlDownloadStream& stream, KxHttpStatus& status)
-{
-    const qint64 length = stream.httpStatus().failed ? 0 : stream.contentLength();
-    QByteArray bytes;
-    if (length > 0 && length <= kMaxResponseSize) {
-        bytes = QByteArray(static_cast<int>(length), Qt::Uninitialized);
-        bytes.resize(static_cast<int>(stream.read(bytes.data(), length).gcount()));
-        stream.peek();  // sees the end, with which the connection is free for the next
-    } else {
-        bytes = readUntilEnd(stream);
-    }
-    status = stream.httpStatus();
-    // No status of the server tells that reading ended at our bound.
-    if (stream.isOpen() && !status.failed) {
-        status.failed = true;
-        status.failure = "The response has a body of more than 1 GiB";
-    }
-    return bytes;
+    if (const Result result = checkCloudObject(address); result.bad())
+        throw std::invalid_argument(address + ' ' + result.text().toStdString());
 }
 
 }  // namespace
 
 struct KxCurlClient::Private
 {
+    /// A copy, so that no request sees half of a change.
     ClientSettings currentSettings() const
     {
         const std::lock_guard lock(mutex);
@@ -136,6 +106,7 @@ KxCurlDownloadStream KxCurlClient::Private::open(KxCurlDownloadRequest::Origin o
     const int concurrent = currentSettings().numConcurrentRequestsPerFile;
     auto buffer = std::make_unique<KxCurlDownloadStreambuf>(std::move(origin), firstRange, concurrent);
     KxCurlDownloadStream stream(buffer.release());
+    // Who gets the stream may ask for the answer's code and length at once.
     stream.peek();
     return stream;
 }
@@ -161,7 +132,7 @@ QJsonDocument KxCurlClient::Private::post(const std::function<PreparedRequest()>
     origin.body = body;
     origin.hasBody = RequestBody::Sent;
     KxCurlDownloadStream stream = open(std::move(origin), std::nullopt);
-    return QJsonDocument::fromJson(readWhole(stream, status));
+    return QJsonDocument::fromJson(readWholeBody(stream, status));
 }
 
 KxCurlClient::KxCurlClient()
@@ -175,13 +146,15 @@ KxCurlClient::KxCurlClient()
 
 KxCurlClient& KxCurlClient::instance()
 {
+    // Never destroyed: threads may still be at work when the process ends.
     static auto* const client = new KxCurlClient;
     return *client;
 }
 
 bool KxCurlClient::isUrl(const char* name)
 {
-    return Kdd::isUrl(name);
+    const std::string_view text = name ? name : "";
+    return text.substr(0, 4) == "http" || text.substr(0, 2) == "gs";
 }
 
 std::string KxCurlClient::url(const std::string& path)
@@ -259,6 +232,7 @@ KxCurlDownloadStream KxCurlClient::readRange(const std::string& url, const std::
 KxCurlDownloadStream KxCurlClient::readFrom(const std::string& url, qint64 start)
 {
     const auto range = firstRange(mPrivate->currentSettings(), start);
+    // Without parallel ranges one open range does, which any server that knows ranges answers.
     if (!range)
         return readRange(url, std::to_string(start) + '-', false);
     return mPrivate->get(
@@ -276,27 +250,27 @@ KxCurlDownloadStream KxCurlClient::readFollowing(const std::string& url, qint64 
         const auto prepare = [=] {
             const ClientSettings settings = mPrivate->currentSettings();
             PreparedRequest first = prepareRequest(url, headers, RequestBody::None, settings);
-            return redirects ? redirects->prepared(std::move(first), settings) : first;
+            return redirects ? redirects->prepared(std::move(first), settings.sessionId) : first;
         };
+        // Its later ranges are prepared in the same way, so they are told no more than the first.
         KxCurlDownloadStream stream = mPrivate->get(prepare, range);
         if (!redirects)
             redirects.emplace(prepareRequest(url, {}, RequestBody::None, ClientSettings()).url);
-        switch (redirects->take(stream.httpStatus())) {
-        case Redirects::Answer::Final:
-            return stream;
-        case Redirects::Answer::Refused:
-            static_cast<KxCurlDownloadStreambuf*>(stream.rdbuf())->currentRequest()->fail(redirects->fault());
-            return stream;
-        case Redirects::Answer::GoOn:
-            break;
-        }
+        Result result;
+        if (redirects->follow(stream.httpStatus(), result))
+            continue;
+        if (result.bad())
+            static_cast<KxCurlDownloadStreambuf*>(stream.rdbuf())
+                ->currentRequest()
+                ->fail(result.text().toStdString());
+        return stream;
     }
 }
 
 QByteArray KxCurlClient::readBytes(const std::string& url, KxHttpStatus& status)
 {
     KxCurlDownloadStream stream = read(url, true);
-    return readWhole(stream, status);
+    return readWholeBody(stream, status);
 }
 
 QJsonDocument KxCurlClient::readJson(const std::string& url, KxHttpStatus& status)
@@ -321,6 +295,14 @@ QJsonDocument KxCurlClient::postWithoutSession(const std::string& url, const QBy
         return prepareRequest(url, {"Content-Type: " + contentType}, RequestBody::Sent, ClientSettings());
     };
     return mPrivate->post(prepare, body, status);
+}
+
+QByteArray KxGoogleAuth::authorizationHeader(KxCurlClient& client)
+{
+    return authorizationHeader(
+        [&client](const std::string& url, const QByteArray& form, KxHttpStatus& status) {
+            return client.postWithoutSession(url, form, "application/x-www-form-urlencoded", status);
+        });
 }
 
 QJsonDocument KxCurlClient::postBytes(const std::string& url, const QByteArray& body, KxHttpStatus& status)

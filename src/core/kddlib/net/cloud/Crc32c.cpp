@@ -48,6 +48,7 @@ quint32 afterStep(const uchar* bytes, quint32 value)
 
 quint32 crc32c(const QByteArray& data, quint32 before)
 {
+    // Inverted at both ends, as the standard has it: so leading zeros count, and parts can be put together.
     quint32 value = ~before;
     const auto* bytes = reinterpret_cast<const uchar*>(data.constData());
     int left = data.size();

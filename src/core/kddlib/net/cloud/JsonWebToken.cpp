@@ -1,6 +1,6 @@
 #include "kddlib/net/cloud/JsonWebToken.h"
 
-#include "platform/base/LogFile.h"
+#include "platform/base/Result.h"
 
 #include <QJsonDocument>
 #include <QJsonObject>
@@ -17,8 +17,8 @@ namespace Kdd
 namespace
 {
 
-constexpr int kMaxKeyBits =
-    16384;  // what OpenSSL itself verifies with; signing takes time with the cube of it
+/// What OpenSSL itself verifies with; signing takes time with the cube of it, and a key comes from outside.
+constexpr int kMaxKeyBits = 16384;
 
 struct Release
 {
@@ -30,12 +30,11 @@ struct Release
 template <typename Object>
 using Owner = std::unique_ptr<Object, Release>;
 
-/// Empty. What OpenSSL noted must not stay: the next user of this thread, curl, would take it for its own fault.
-QByteArray failure(const char* message)
+/// What OpenSSL noted must not stay: the next user of this thread, curl, would take it for its own fault.
+Result failure(const char* reason)
 {
     ERR_clear_error();
-    LogFile::errorf("%s", message);
-    return {};
+    return Result::failure(QString::fromLatin1(reason));
 }
 
 /// A server has nobody to ask, and OpenSSL would ask on the terminal.
@@ -52,7 +51,7 @@ Owner<EVP_PKEY> readRsaKey(BIO* pem)
     return key;
 }
 
-QByteArray signature(const QByteArray& text, const QByteArray& privateKey)
+Result sign(const QByteArray& text, const QByteArray& privateKey, QByteArray& signature)
 {
     const Owner<EVP_MD_CTX> context(EVP_MD_CTX_create());
     if (!context)
@@ -70,6 +69,7 @@ QByteArray signature(const QByteArray& text, const QByteArray& privateKey)
         return failure("Could not initialize PEM digest.");
     if (EVP_DigestSignUpdate(context.get(), text.constData(), static_cast<std::size_t>(text.size())) != 1)
         return failure("Could not update PEM digest.");
+    // The first call only tells how long the signature can become.
     std::size_t length = 0;
     if (EVP_DigestSignFinal(context.get(), nullptr, &length) != 1)
         return failure("Could not finalize PEM digest (1/2).");
@@ -77,7 +77,8 @@ QByteArray signature(const QByteArray& text, const QByteArray& privateKey)
     if (EVP_DigestSignFinal(context.get(), reinterpret_cast<uchar*>(bytes.data()), &length) != 1)
         return failure("Could not finalize PEM digest (2/2).");
     bytes.truncate(static_cast<int>(length));
-    return bytes;
+    signature = bytes;
+    return {};
 }
 
 QByteArray encoded(const QByteArray& bytes)
@@ -92,12 +93,15 @@ QByteArray encoded(const QJsonObject& object)
 
 }  // namespace
 
-QByteArray signedJsonWebToken(const QJsonObject& header, const QJsonObject& claims,
-                              const QByteArray& privateKey)
+Result signJsonWebToken(const QJsonObject& header, const QJsonObject& claims, const QByteArray& privateKey,
+                        QByteArray& token)
 {
     const QByteArray text = encoded(header) + '.' + encoded(claims);
-    const QByteArray bytes = signature(text, privateKey);
-    return bytes.isEmpty() ? QByteArray() : text + '.' + encoded(bytes);
+    QByteArray signature;
+    Result result = sign(text, privateKey, signature);
+    if (result.good())
+        token = text + '.' + encoded(signature);
+    return result;
 }
 
 }  // namespace Kdd

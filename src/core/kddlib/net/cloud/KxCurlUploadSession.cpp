@@ -1,8 +1,9 @@
 #include "kddlib/net/cloud/KxCurlUploadSession.h"
 
+#include "kddlib/net/cloud/CloudAddress.h"
 #include "kddlib/net/cloud/UploadErrors.h"
+#include "kddlib/net/http/HttpAnswer.h"
 #include "kddlib/net/http/KxCurlRequest.h"
-#include "kddlib/net/http/PreparedRequest.h"
 #include "kddlib/net/http/WebOrigin.h"
 #include "platform/base/LogFile.h"
 #include "platform/resources/ExResource.h"
@@ -17,12 +18,9 @@ namespace Kdd
 namespace
 {
 
-constexpr int kOk = 200;
-constexpr int kCreated = 201;
-constexpr int kResumeIncomplete = 308;
-
 // Programs look for this text, also for a session that could not be opened.
 constexpr char kChunkExhausted[] = "Retry policy exhausted in KxCurlUploadSession::uploadChunk().";
+constexpr char kResetExhausted[] = "Retry policy exhausted in KxCurlUploadSession::resetSession().";
 
 /// Chunks that the storage takes in part are gone on with at once. In steps of 256 KiB this suffices for 16 MiB; a
 /// storage that takes less at a time is treated like one that takes nothing.
@@ -34,10 +32,35 @@ bool isUnrecoverable(int code)
     return std::find(std::begin(codes), std::end(codes), code) != std::end(codes);
 }
 
+std::string codeText(int code)
+{
+    return "HTTP code " + std::to_string(code);
+}
+
 std::string contentLength(int length)
 {
     return "Content-Length: " + std::to_string(length);
 }
+
+}  // namespace
+
+/// How the log tells of a step that has to be tried again.
+struct UploadStep
+{
+    const char* name;
+    LogFile::Severity severity;  // of a transfer that did not come through
+    const char* faultText;
+};
+
+namespace
+{
+
+constexpr UploadStep kStart = {"starting", LogFile::Severity::Warning,
+                               "Curl error while starting resumable upload: "};
+constexpr UploadStep kChunk = {"continuing", LogFile::Severity::Error,
+                               "Recevied curl error: "};  // spelt as programs know it
+constexpr UploadStep kReset = {"resetting", LogFile::Severity::Warning,
+                               "Curl error while resetting resumable upload: "};
 
 }  // namespace
 
@@ -51,26 +74,35 @@ KxCurlUploadSession::KxCurlUploadSession(std::shared_ptr<KxCurlHandleFactory> fa
     start();
 }
 
+bool KxCurlUploadSession::repeat(RetryPolicy& policy, const UploadStep& step, const Attempt& attempt)
+{
+    while (!policy.exhausted()) {
+        try {
+            if (attempt())
+                return true;
+        } catch (const CurlError& error) {
+            note(error, step);
+        }
+        if (const std::chrono::milliseconds delay = policy.nextDelay(); delay.count() > 0)
+            mSleep(delay);
+    }
+    return false;
+}
+
 void KxCurlUploadSession::start()
 {
     RetryPolicy policy;
-    while (!policy.exhausted()) {
+    const bool isOpen = repeat(policy, kStart, [this] {
         mSessionUrl.clear();
-        try {
-            const int code = exchange(
-                "POST", mTarget.url,
-                {contentLength(0), "x-goog-resumable: start", "Content-Type: " + mTarget.contentType});
-            if (code == kCreated && mSessionUrl.empty())
-                throw UnrecoverableResponseError("The cloud storage does not name the upload session");
-            if (code == kCreated)
-                return;
-            takeCode(code, "starting");
-        } catch (const CurlError& error) {
-            note(error, LogFile::Severity::Warning, "Curl error while starting resumable upload: ");
-        }
-        pause(policy);
-    }
-    throw RetryPolicyExhaustedError(kChunkExhausted, mLastFault);
+        const int code =
+            exchange("POST", mTarget.url,
+                     {contentLength(0), "x-goog-resumable: start", "Content-Type: " + mTarget.contentType});
+        if (code == kCreated && mSessionUrl.empty())
+            throw UnrecoverableResponseError("The cloud storage does not name the upload session");
+        return code == kCreated || isInVain(code, kStart);
+    });
+    if (!isOpen)
+        throw RetryPolicyExhaustedError(kChunkExhausted, mLastFault);
 }
 
 void KxCurlUploadSession::uploadChunk(const QByteArray& data, Chunk kind)
@@ -83,85 +115,73 @@ void KxCurlUploadSession::uploadChunk(const QByteArray& data, Chunk kind)
 
     RetryPolicy policy;
     int shortWrites = 0;
-    while (!isDone()) {
-        if (policy.exhausted())
-            throw RetryPolicyExhaustedError(kChunkExhausted, mLastFault);
-        // What the storage has of the chunk is skipped; the rest is sent from where it lies.
-        const quint64 before = mNextOffset;
-        const auto left = static_cast<int>(end - before);
-        const QByteArray rest = QByteArray::fromRawData(data.constData() + data.size() - left, left);
-        const Attempt attempt = tryChunk(rest, kind);
-        const bool isShortWrite = mNextOffset > before && ++shortWrites <= kMaxShortWrites;
-        if (isDone() || (attempt == Attempt::Answered && isShortWrite))
-            continue;
-        pause(policy);
-        if (attempt == Attempt::Failed || !policy.exhausted())
+    bool isFirst = true;
+    bool isAnswered = true;
+    const bool isSent = repeat(policy, kChunk, [&] {
+        // What became of the attempt before only the storage knows, be it that its answer was lost.
+        if (!std::exchange(isFirst, false))
             reset(policy);
-    }
+        for (quint64 before = mNextOffset; !isDone(); before = mNextOffset) {
+            // What the storage has of the chunk is skipped; the rest is sent from where it lies.
+            const auto left = static_cast<int>(end - mNextOffset);
+            isAnswered = false;
+            sendChunk(QByteArray::fromRawData(data.constData() + data.size() - left, left), kind);
+            isAnswered = true;
+            // A short write is an answer, not a fault: the rest follows at once and no attempt is counted.
+            const bool isShortWrite = mNextOffset > before && ++shortWrites <= kMaxShortWrites;
+            if (!isShortWrite)
+                return isDone();
+        }
+        return true;
+    });
+    if (!isSent)
+        throw RetryPolicyExhaustedError(isAnswered ? kChunkExhausted : kResetExhausted, mLastFault);
 }
 
-KxCurlUploadSession::Attempt KxCurlUploadSession::tryChunk(const QByteArray& rest, Chunk kind)
+void KxCurlUploadSession::sendChunk(const QByteArray& rest, Chunk kind)
 {
     const quint64 start = mNextOffset;
     const quint64 end = start + static_cast<quint64>(rest.size());
     std::string range = "Content-Range: bytes ";
     range += rest.isEmpty() ? "*" : std::to_string(start) + '-' + std::to_string(end - 1);
     range += '/' + (kind == Chunk::Last ? std::to_string(end) : std::string("*"));
+    // Before it is sent: of a transfer that breaks off all bytes may have come.
     mSentEnd = std::max(mSentEnd, end);
-    try {
-        const int code = exchange("PUT", mSessionUrl, {contentLength(rest.size()), range}, rest);
-        if (code != kResumeIncomplete && !mIsComplete)
-            takeCode(code, "continuing");
-    } catch (const CurlError& error) {
-        note(error, LogFile::Severity::Error, "Recevied curl error: ");
-        return Attempt::Failed;
-    }
+    const int code = exchange("PUT", mSessionUrl, {contentLength(rest.size()), range}, rest);
+    if (code != kResumeIncomplete && !mIsComplete)
+        isInVain(code, kChunk);
     if (!mIsComplete && mNextOffset != end)
         LogFile::warnf("Short write to Google Cloud Storage.\nContent length: %zu\nActually written: %zu",
                        static_cast<std::size_t>(rest.size()), static_cast<std::size_t>(mNextOffset - start));
-    return Attempt::Answered;
 }
 
 /// Only an answer about the upload tells where it stands. After any other the chunk would be sent to a place where the
 /// storage may no longer be.
 void KxCurlUploadSession::reset(RetryPolicy& policy)
 {
-    while (!policy.exhausted()) {
-        try {
-            const int code = exchange("PUT", mSessionUrl, {contentLength(0), "Content-Range: bytes */*"});
-            if (code == kResumeIncomplete || mIsComplete)
-                return;
-            takeCode(code, "resetting");
-        } catch (const CurlError& error) {
-            note(error, LogFile::Severity::Warning, "Curl error while resetting resumable upload: ");
-        }
-        pause(policy);
-    }
-    throw RetryPolicyExhaustedError("Retry policy exhausted in KxCurlUploadSession::resetSession().",
-                                    mLastFault);
+    const bool isKnown = repeat(policy, kReset, [this] {
+        const int code = exchange("PUT", mSessionUrl, {contentLength(0), "Content-Range: bytes */*"});
+        return code == kResumeIncomplete || mIsComplete || isInVain(code, kReset);
+    });
+    if (!isKnown)
+        throw RetryPolicyExhaustedError(kResetExhausted, mLastFault);
 }
 
 /// A transfer that did not come through.
-void KxCurlUploadSession::note(const CurlError& error, LogFile::Severity severity, const char* what)
+void KxCurlUploadSession::note(const CurlError& error, const UploadStep& step)
 {
-    LogFile::write(severity, what + textForLog(error));
+    LogFile::write(step.severity, step.faultText + textForLog(error));
     mLastFault = error.what();
     // It becomes part of a message of one line.
     std::replace(mLastFault.begin(), mLastFault.end(), '\n', ' ');
 }
 
-/// An answer that brings the step no further.
-void KxCurlUploadSession::takeCode(int code, const char* step)
+/// An answer that brings the step no further; false, as the result of its attempt.
+bool KxCurlUploadSession::isInVain(int code, const UploadStep& step)
 {
-    mLastFault = "HTTP code " + std::to_string(code);
-    LogFile::warnf("HTTP code %d while %s resumable upload", code, step);
-}
-
-void KxCurlUploadSession::pause(RetryPolicy& policy) const
-{
-    const std::chrono::milliseconds delay = policy.nextDelay();
-    if (delay.count() > 0)
-        mSleep(delay);
+    mLastFault = codeText(code);
+    LogFile::warnf("%s while %s resumable upload", mLastFault.c_str(), step.name);
+    return false;
 }
 
 int KxCurlUploadSession::exchange(const std::string& method, const std::string& url,
@@ -205,6 +225,7 @@ std::vector<std::string> KxCurlUploadSession::storageHeaders(const std::string& 
 void KxCurlUploadSession::take(const KxCurlRequest& request)
 {
     const KxHttpStatus& status = request.status();
+    // Without an address there is no session: a server that answers the start by 200 has not made one.
     const bool isOpen = !mSessionUrl.empty();
     if (isOpen && (status.code == kOk || status.code == kCreated)) {
         takeEnd(request);
@@ -212,12 +233,12 @@ void KxCurlUploadSession::take(const KxCurlRequest& request)
     }
     if (isUnrecoverable(status.code))
         throw UnrecoverableResponseError(
-            "HTTP code " + std::to_string(status.code) +
+            codeText(status.code) +
             "indicates that this upload session failed and can not be recovered from.");
-    if (const auto location = status.headers.find("location"); location != status.headers.end())
-        takeLocation(location->second);
-    if (const auto range = status.headers.find("range"); range != status.headers.end())
-        takeRange(range->second);
+    if (const std::string* const location = findHeader(status, "location"))
+        takeLocation(*location);
+    if (const std::string* const range = findHeader(status, "range"))
+        takeRange(*range);
 }
 
 void KxCurlUploadSession::takeLocation(const std::string& location)
@@ -225,7 +246,7 @@ void KxCurlUploadSession::takeLocation(const std::string& location)
     const std::string& base = mSessionUrl.empty() ? mTarget.url : mSessionUrl;
     const std::string url = resolvedUrl(base, location);
     const WebOrigin origin = originOf(url);
-    if (!origin.isValid() || (origin.scheme == "http" && originOf(mTarget.url).scheme == "https"))
+    if (!origin.isValid() || leavesTls(originOf(mTarget.url), origin))
         throw UnrecoverableResponseError("The cloud storage names \"" + location +
                                          "\" as the upload session, where nothing can be sent in safety");
     mSessionUrl = url;
@@ -233,12 +254,12 @@ void KxCurlUploadSession::takeLocation(const std::string& location)
 
 void KxCurlUploadSession::takeRange(const std::string& range)
 {
-    constexpr std::string_view kStart = "bytes=0-";
-    if (range.compare(0, kStart.size(), kStart) != 0)
+    constexpr std::string_view kPrefix = "bytes=0-";
+    if (range.compare(0, kPrefix.size(), kPrefix) != 0)
         return;
     quint64 last = 0;
     const char* const textEnd = range.data() + range.size();
-    const auto [numberEnd, error] = std::from_chars(range.data() + kStart.size(), textEnd, last);
+    const auto [numberEnd, error] = std::from_chars(range.data() + kPrefix.size(), textEnd, last);
     const bool isNumber = error == std::errc() && numberEnd == textEnd;
     if (!isNumber || last >= mSentEnd || last + 1 < mNextOffset)
         throw UnrecoverableResponseError("The cloud storage claims to have \"" + range + "\" after " +
@@ -249,13 +270,14 @@ void KxCurlUploadSession::takeRange(const std::string& range)
 
 void KxCurlUploadSession::takeEnd(const KxCurlRequest& request)
 {
+    // Else an object that lacks its end would pass for the whole.
     if (!mTotal || mSentEnd < *mTotal)
         throw UnrecoverableResponseError(
             "The cloud storage ended the upload before the last bytes were sent");
-    const std::string difference = mChecksums.difference(request.status(), request.response());
-    if (!difference.empty())
-        throw UnrecoverableResponseError("The object in the cloud storage is not what was sent: " +
-                                         difference);
+    const Result result = mChecksums.compare(request.status(), request.response())
+                              .within(QStringLiteral("The object in the cloud storage is not what was sent"));
+    if (result.bad())
+        throw UnrecoverableResponseError(result.text().toStdString());
     mNextOffset = *mTotal;
     mIsComplete = true;
 }

@@ -1,9 +1,8 @@
 #pragma once
 
+#include "kddlib/net/cloud/RetryPolicy.h"
 #include "kddlib/net/cloud/UploadChecksums.h"
 #include "kddlib/net/http/KxCurlHandleFactory.h"
-#include "kddlib/net/http/RetryPolicy.h"
-#include "platform/base/LogFile.h"
 
 #include <QByteArray>
 
@@ -20,6 +19,7 @@ namespace Kdd
 class CurlError;
 class CurlShare;
 class KxCurlRequest;
+struct UploadStep;
 
 /// What is uploaded where.
 struct UploadTarget
@@ -62,14 +62,17 @@ public:
     bool isComplete() const { return mIsComplete; }
 
 private:
-    enum class Attempt { Answered, Failed };
+    /// Whether the step is done. A CurlError is a failed attempt, too.
+    using Attempt = std::function<bool()>;
+
+    /// Tries a step until it is done or the policy exhausted; which of both.
+    bool repeat(RetryPolicy& policy, const UploadStep& step, const Attempt& attempt);
 
     void start();
-    Attempt tryChunk(const QByteArray& rest, Chunk kind);
+    void sendChunk(const QByteArray& rest, Chunk kind);
     void reset(RetryPolicy& policy);
-    void note(const CurlError& error, LogFile::Severity severity, const char* what);
-    void takeCode(int code, const char* step);
-    void pause(RetryPolicy& policy) const;
+    void note(const CurlError& error, const UploadStep& step);
+    bool isInVain(int code, const UploadStep& step);
 
     int exchange(const std::string& method, const std::string& url, const std::vector<std::string>& headers,
                  const QByteArray& body = {});

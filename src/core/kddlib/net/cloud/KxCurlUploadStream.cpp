@@ -29,6 +29,7 @@ KxCurlUploadStream& KxCurlUploadStream::operator=(KxCurlUploadStream&& other) no
 {
     if (this == &other)
         return *this;
+    // What was written before becomes an object, as it would by the end of the stream.
     closeSilently();
     std::ostream::operator=(std::move(other));
     takeBuffer(other);
@@ -65,6 +66,7 @@ void KxCurlUploadStream::leaveErrorsToCaller()
 
 void KxCurlUploadStream::closeSilently() noexcept
 {
+    // A destructor must not throw, whatever the caller wants of his writes.
     exceptions(goodbit);
     close();
 }

@@ -42,6 +42,7 @@ QByteArray KxCurlUploadStreambuf::pending() const
 
 bool KxCurlUploadStreambuf::flushWholeChunks()
 {
+    // The storage takes nothing but whole steps until the last chunk; the rest waits for its fellows.
     const int count = pending().size();
     const int remainder = count % KxCurlUploadSession::kGranularity;
     const int whole = count - remainder;
@@ -65,6 +66,7 @@ KxCurlUploadStreambuf::int_type KxCurlUploadStreambuf::overflow(int_type charact
 {
     if (sync() != 0)
         return traits_type::eof();
+    // Less than a step is left, so that there is room again.
     if (!traits_type::eq_int_type(character, traits_type::eof()))
         sputc(traits_type::to_char_type(character));
     return traits_type::not_eof(character);
@@ -74,6 +76,7 @@ bool KxCurlUploadStreambuf::close()
 {
     const bool isDone =
         guard("final flush", [&] { mSession->uploadChunk(pending(), KxCurlUploadSession::Chunk::Last); });
+    // Closed whatever came of it: after a final chunk there is nothing that could be sent.
     abandon();
     return isDone;
 }

@@ -1,10 +1,10 @@
 #include "kddlib/net/cloud/KxGoogleAuth.h"
 
-#include "kddlib/net/KxCurlClient.h"
 #include "kddlib/net/cloud/JsonWebToken.h"
 #include "kddlib/net/cloud/ServiceAccountKey.h"
 #include "kddlib/net/http/KxHttpStatus.h"
 #include "platform/base/LogFile.h"
+#include "platform/base/Result.h"
 
 #include <QJsonDocument>
 #include <QJsonObject>
@@ -65,12 +65,11 @@ bool isHeaderText(const QString& text)
 
 struct KxGoogleAuth::Private
 {
+    bool startWith(const ServiceAccountKey& newKey, const Result& reading);
     bool loadFile();
-    bool loadObject(const QJsonObject& object, const char* source);
-    void startWith(const ServiceAccountKey& newKey);
     bool isFresh(qint64 now) const { return !header.isEmpty() && expiry - kMargin >= now; }
-    QByteArray requestBody(qint64 now) const;
-    QByteArray fetch(KxCurlClient& client, qint64 now);
+    Result makeForm(qint64 now, QByteArray& form) const;
+    QByteArray fetch(const Exchange& exchange, qint64 now);
     QByteArray takeAnswer(const QJsonDocument& answer, qint64 now);
 
     std::mutex mutex;
@@ -83,33 +82,29 @@ struct KxGoogleAuth::Private
     qint64 expiry = 0;  // [100 ns since 1970]
 };
 
+/// False, with the error logged and the former key still in force, when reading the new one failed.
+bool KxGoogleAuth::Private::startWith(const ServiceAccountKey& newKey, const Result& reading)
+{
+    if (reading.bad()) {
+        LogFile::errorf("%s", qUtf8Printable(reading.text()));
+        return false;
+    }
+    key = newKey;
+    bodyPrefix = "grant_type=" + QUrl::toPercentEncoding(QLatin1String(kGrantType));
+    // Its token is another account's.
+    header.clear();
+    return true;
+}
+
 bool KxGoogleAuth::Private::loadFile()
 {
     ServiceAccountKey newKey;
-    if (!readServiceAccountFile(newKey))
-        return false;
-    startWith(newKey);
-    return true;
+    const Result reading = readServiceAccountFile(newKey);
+    return startWith(newKey, reading);
 }
 
-bool KxGoogleAuth::Private::loadObject(const QJsonObject& object, const char* source)
-{
-    ServiceAccountKey newKey;
-    if (!readServiceAccountKey(object, source, newKey))
-        return false;
-    startWith(newKey);
-    return true;
-}
-
-void KxGoogleAuth::Private::startWith(const ServiceAccountKey& newKey)
-{
-    key = newKey;
-    bodyPrefix = "grant_type=" + QUrl::toPercentEncoding(QLatin1String(kGrantType));
-    header.clear();
-}
-
-/// Empty, with an error in the log, when the key cannot sign.
-QByteArray KxGoogleAuth::Private::requestBody(qint64 now) const
+/// The form that asks for a token.
+Result KxGoogleAuth::Private::makeForm(qint64 now, QByteArray& form) const
 {
     const qint64 seconds = now / kTicksPerSecond;
     const QJsonObject jwtHeader = {{QStringLiteral("alg"), QStringLiteral("RS256")},
@@ -123,18 +118,21 @@ QByteArray KxGoogleAuth::Private::requestBody(qint64 now) const
         {QStringLiteral("exp"), seconds + kTokenRequestLifetime}};
     if (!subject.empty())
         claims.insert(QStringLiteral("sub"), QString::fromStdString(subject));
-    const QByteArray token = signedJsonWebToken(jwtHeader, claims, QByteArray::fromStdString(key.privateKey));
-    return token.isEmpty() ? QByteArray() : bodyPrefix + "&assertion=" + token;
+    QByteArray token;
+    Result signing = signJsonWebToken(jwtHeader, claims, QByteArray::fromStdString(key.privateKey), token);
+    form = bodyPrefix + "&assertion=" + token;
+    return signing;
 }
 
-QByteArray KxGoogleAuth::Private::fetch(KxCurlClient& client, qint64 now)
+QByteArray KxGoogleAuth::Private::fetch(const Exchange& exchange, qint64 now)
 {
-    const QByteArray body = requestBody(now);
-    if (body.isEmpty())
+    QByteArray form;
+    if (const Result signing = makeForm(now, form); signing.bad()) {
+        LogFile::errorf("%s", qUtf8Printable(signing.text()));
         return {};
+    }
     KxHttpStatus status;
-    const QJsonDocument answer =
-        client.postWithoutSession(key.tokenUri, body, "application/x-www-form-urlencoded", status);
+    const QJsonDocument answer = exchange(key.tokenUri, form, status);
     if (status.ok())
         return takeAnswer(answer, now);
     const QByteArray reason =
@@ -149,6 +147,7 @@ QByteArray KxGoogleAuth::Private::takeAnswer(const QJsonDocument& answer, qint64
     const QString token = answer.object().value(QLatin1String("access_token")).toString();
     const QString type = answer.object().value(QLatin1String("token_type")).toString();
     const double lifetime = answer.object().value(QLatin1String("expires_in")).toDouble();
+    // The former token stays: until its own margin it is as good as before.
     if (!isHeaderText(token) || !isHeaderText(type)) {
         LogFile::errorf("Invalid authorization response. %s", withoutToken(answer).constData());
         return {};
@@ -180,7 +179,9 @@ bool KxGoogleAuth::loadCredentials()
 bool KxGoogleAuth::loadCredentialsFromJson(const QJsonObject& object, const char* source)
 {
     const std::lock_guard lock(mPrivate->mutex);
-    return mPrivate->loadObject(object, source);
+    ServiceAccountKey newKey;
+    const Result reading = readServiceAccountKey(object, source, newKey);
+    return mPrivate->startWith(newKey, reading);
 }
 
 void KxGoogleAuth::setScopes(const std::vector<std::string>& scopes)
@@ -197,14 +198,15 @@ void KxGoogleAuth::setSubject(const std::string& subject)
     mPrivate->header.clear();
 }
 
-QByteArray KxGoogleAuth::authorizationHeader(KxCurlClient& client)
+QByteArray KxGoogleAuth::authorizationHeader(const Exchange& exchange)
 {
+    // Held during the exchange: threads that come meanwhile wait for this token instead of each asking for one.
     const std::lock_guard lock(mPrivate->mutex);
     const qint64 now = mPrivate->clock();
     if (mPrivate->isFresh(now))
         return mPrivate->header;
     const bool hasKey = !mPrivate->key.privateKey.empty() || mPrivate->loadFile();
-    return hasKey ? mPrivate->fetch(client, now) : QByteArray();
+    return hasKey ? mPrivate->fetch(exchange, now) : QByteArray();
 }
 
 }  // namespace Kdd

@@ -9,12 +9,14 @@
 #include <string>
 #include <vector>
 
+class QJsonDocument;
 class QJsonObject;
 
 namespace Kdd
 {
 
 class KxCurlClient;
+struct KxHttpStatus;
 
 /// Gets access tokens for the cloud storage with a service account's key: it signs who it is, exchanges that at the
 /// place that the key names, and keeps the token until shortly before it expires.
@@ -26,6 +28,11 @@ class KDD_EXPORT KxGoogleAuth
 public:
     /// The time since 1970 [100 ns].
     using Clock = std::function<qint64()>;
+
+    /// Posts a form ("application/x-www-form-urlencoded") to the URL where tokens come from and gives the answer, null
+    /// when it is no JSON, and what became of the request.
+    using Exchange =
+        std::function<QJsonDocument(const std::string& url, const QByteArray& form, KxHttpStatus& status)>;
 
     /// Follows the system's clock.
     KxGoogleAuth();
@@ -50,7 +57,10 @@ public:
     void setSubject(const std::string& subject);
 
     /// "Authorization: " and the token, or empty when none is to be had. Reads the key first when none was given. A
-    /// token in its last 500 seconds is replaced. CurlError when the exchange cannot be set up.
+    /// token in its last 500 seconds is replaced. Passes on what the exchange throws.
+    QByteArray authorizationHeader(const Exchange& exchange);
+
+    /// The same with an exchange by a client, which may throw CurlError. Belongs to the client, above this class.
     QByteArray authorizationHeader(KxCurlClient& client);
 
 private:

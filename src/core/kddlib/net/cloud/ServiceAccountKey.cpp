@@ -2,12 +2,14 @@
 
 #include "kddlib/Limits.h"
 #include "kddlib/net/http/WebOrigin.h"
-#include "platform/base/LogFile.h"
+#include "platform/base/Result.h"
 #include "platform/resources/ExResource.h"
 
 #include <QFile>
 #include <QJsonDocument>
 #include <QJsonObject>
+
+#include <utility>
 
 namespace Kdd
 {
@@ -22,72 +24,57 @@ std::string textOf(const QJsonObject& object, const char* field)
     return object.value(QLatin1String(field)).toString().toStdString();
 }
 
-bool readField(const QJsonObject& object, const char* field, const char* source, std::string& text)
+/// The places of a message take texts, in order.
+template <typename... Texts>
+Result failure(const char* message, const Texts&... texts)
 {
-    text = textOf(object, field);
-    if (text.empty())
-        LogFile::errorf("Field '%s' is missing in %s", field, source);
-    return !text.empty();
-}
-
-/// A place of the cloud storage itself would have to be authorised by the token that is asked for there.
-bool readTokenUri(const QJsonObject& object, const char* source, std::string& uri)
-{
-    uri = textOf(object, "token_uri");
-    if (uri.empty())
-        uri = ExResource::cloudTokenEndpoint().toStdString();
-    const bool isUsable = originOf(uri).isValid();
-    if (!isUsable)
-        LogFile::errorf("Field 'token_uri' is '%s' in %s, which is no web address", uri.c_str(), source);
-    return isUsable;
+    return Result::failure(QString::fromLatin1(message).arg(QString::fromUtf8(texts)...));
 }
 
 }  // namespace
 
-bool readServiceAccountKey(const QJsonObject& object, const char* source, ServiceAccountKey& key)
+Result readServiceAccountKey(const QJsonObject& object, const char* source, ServiceAccountKey& key)
 {
     const std::string type = textOf(object, "type");
-    if (type != kType) {
-        LogFile::errorf("Credential type is '%s' in %s, expected '%s'", type.c_str(), source, kType);
-        return false;
-    }
+    if (type != kType)
+        return failure("Credential type is '%1' in %2, expected '%3'", type.c_str(), source, kType);
     ServiceAccountKey read;
-    if (!readField(object, "private_key_id", source, read.id) ||
-        !readField(object, "private_key", source, read.privateKey) ||
-        !readField(object, "client_email", source, read.clientEmail) ||
-        !readTokenUri(object, source, read.tokenUri))
-        return false;
+    const std::pair<const char*, std::string&> required[] = {
+        {"private_key_id", read.id}, {"private_key", read.privateKey}, {"client_email", read.clientEmail}};
+    for (const auto& [field, text] : required) {
+        text = textOf(object, field);
+        if (text.empty())
+            return failure("Field '%1' is missing in %2", field, source);
+    }
+    read.tokenUri = textOf(object, "token_uri");
+    if (read.tokenUri.empty())
+        read.tokenUri = ExResource::cloudTokenEndpoint().toStdString();
+    // A place of the cloud storage itself would have to be authorised by the token that is asked for there.
+    if (!originOf(read.tokenUri).isValid())
+        return failure("Field 'token_uri' is '%1' in %2, which is no web address", read.tokenUri.c_str(),
+                       source);
     key = std::move(read);
-    return true;
+    return {};
 }
 
-bool readServiceAccountFile(ServiceAccountKey& key)
+Result readServiceAccountFile(ServiceAccountKey& key)
 {
     const QByteArray path = qgetenv(kVariable);
-    if (path.isEmpty()) {
-        LogFile::errorf("Environment variable %s not defined", kVariable);
-        return false;
-    }
+    if (path.isEmpty())
+        return failure("Environment variable %1 not defined", kVariable);
     QFile file(QFile::decodeName(path));
-    if (!file.exists()) {
-        LogFile::errorf("ADC file %s does not exist", path.constData());
-        return false;
-    }
-    if (!file.open(QIODevice::ReadOnly)) {
-        LogFile::errorf("Could not open %s: %s", path.constData(), qUtf8Printable(file.errorString()));
-        return false;
-    }
+    if (!file.exists())
+        return failure("ADC file %1 does not exist", path.constData());
+    if (!file.open(QIODevice::ReadOnly))
+        return failure("Could not open %1: %2", path.constData(), qUtf8Printable(file.errorString()));
+    // One byte more than allowed tells that it is too long, without reading what may be endless.
     const QByteArray content = file.read(kMaxServiceAccountFile + 1);
     const QJsonDocument document =
         content.size() > kMaxServiceAccountFile ? QJsonDocument() : QJsonDocument::fromJson(content);
-    if (document.isNull()) {
-        LogFile::errorf("Could not read Json document from %s", path.constData());
-        return false;
-    }
-    if (document.object().isEmpty()) {
-        LogFile::errorf("Empty Json object in %s", path.constData());
-        return false;
-    }
+    if (document.isNull())
+        return failure("Could not read Json document from %1", path.constData());
+    if (document.object().isEmpty())
+        return failure("Empty Json object in %1", path.constData());
     return readServiceAccountKey(document.object(), path.constData(), key);
 }
 

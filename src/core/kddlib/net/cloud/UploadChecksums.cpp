@@ -1,7 +1,9 @@
 #include "kddlib/net/cloud/UploadChecksums.h"
 
 #include "kddlib/net/cloud/Crc32c.h"
+#include "kddlib/net/http/HttpAnswer.h"
 #include "kddlib/net/http/KxHttpStatus.h"
+#include "platform/base/Result.h"
 
 #include <QJsonDocument>
 #include <QJsonObject>
@@ -48,13 +50,11 @@ UploadChecksums::Claims UploadChecksums::claimsOf(const KxHttpStatus& status, co
         for (const auto& [field, name] : fields)
             claims[name] = object.value(QLatin1String(field)).toString().toStdString();
     }
-    if (const auto length = status.headers.find("x-goog-stored-content-length");
-        length != status.headers.end())
-        claims[kLength] = length->second;
+    if (const std::string* const length = findHeader(status, "x-goog-stored-content-length"))
+        claims[kLength] = *length;
     // One line with all checksums, or one line for each, of which the last is known.
-    const auto header = status.headers.find("x-goog-hash");
-    const QByteArray hashes =
-        header == status.headers.end() ? QByteArray() : QByteArray::fromStdString(header->second);
+    const std::string* const header = findHeader(status, "x-goog-hash");
+    const QByteArray hashes = header ? QByteArray::fromStdString(*header) : QByteArray();
     for (const QByteArray& hash : hashes.split(',')) {
         const int end = hash.indexOf('=');
         claims[hash.left(end).trimmed().toStdString()] = hash.mid(end + 1).trimmed().toStdString();
@@ -62,13 +62,14 @@ UploadChecksums::Claims UploadChecksums::claimsOf(const KxHttpStatus& status, co
     return claims;
 }
 
-std::string UploadChecksums::difference(const KxHttpStatus& status, const QByteArray& response) const
+Result UploadChecksums::compare(const KxHttpStatus& status, const QByteArray& response) const
 {
     Claims claims = claimsOf(status, response);
     for (const auto& [name, value] : own()) {
         const std::string& claim = claims[name];
+        // What the storage does not name speaks for nothing and against nothing.
         if (!claim.empty() && claim != value)
-            return std::string(name).append(" ").append(claim).append(" instead of ").append(value);
+            return Result::failure(QString::fromStdString(name + ' ' + claim + " instead of " + value));
     }
     return {};
 }

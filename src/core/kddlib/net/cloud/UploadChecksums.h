@@ -9,6 +9,7 @@
 namespace Kdd
 {
 
+class Result;
 struct KxHttpStatus;
 
 /// What is known of the bytes that were sent, to be held against what the cloud storage says that it has.
@@ -21,8 +22,8 @@ public:
     quint64 length() const { return mLength; }
 
     /// Holds length, CRC-32C and MD5 against those that the storage names in the headers or the JSON of its answer to
-    /// the last bytes. Tells the first difference; empty when there is none or nothing is named.
-    std::string difference(const KxHttpStatus& status, const QByteArray& response) const;
+    /// the last bytes. Fails with the first difference; nothing speaks against what is not named.
+    Result compare(const KxHttpStatus& status, const QByteArray& response) const;
 
 private:
     using Claims = std::map<std::string, std::string>;

@@ -37,6 +37,7 @@ BufferedFileProducer::BufferedFileProducer(const char* path, qint64 offset, cons
 /// Reads at the position; at most 0 when nothing is to be had, or may be.
 qint64 BufferedFileProducer::readFile(void* bytes, qint64 count)
 {
+    // Read first and asked afterwards: a file that is written in between is noticed, too.
     const qint64 got = mFile.readAt(mPosition, bytes, count);
     if (got <= 0)
         mStatus = EC_InvalidStream;
@@ -61,6 +62,7 @@ offile_off_t BufferedFileProducer::read(void* bytes, offile_off_t count)
     while (left > 0) {
         const bool isInWindow = mPosition >= mWindowStart && mPosition < mWindowStart + mWindowSize;
         qint64 part = 0;
+        // Long values go straight to where they are wanted.
         if (!isInWindow && left >= kWindow) {
             part = readFile(to, left);
         } else if (isInWindow || fillWindow()) {
@@ -79,6 +81,7 @@ offile_off_t BufferedFileProducer::read(void* bytes, offile_off_t count)
 
 offile_off_t BufferedFileProducer::skip(offile_off_t count)
 {
+    // Only the position moves: what lies between is never read.
     const qint64 skipped = good() ? qMax<qint64>(0, qMin<qint64>(count, avail())) : 0;
     mPosition += skipped;
     return skipped;

@@ -30,6 +30,7 @@ const QByteArray kSequenceEnd("\xfe\xff\xdd\xe0\0\0\0\0", 8);
 bool readWhole(const char* path, QByteArray& bytes)
 {
     RandomAccessFile file;
+    // All in memory, for elements are looked at in any order; the bound keeps a damaged length from taking it all.
     if (file.open(path) != 0 || file.size() > kMaxFileBytes)
         return false;
     bytes.resize(static_cast<int>(file.size()));
@@ -130,6 +131,7 @@ public:
     {
         while (at < mBytes.size())
             at = takeElement(at);
+        // Last, because the number of bytes that the frames need stands in other elements.
         if (mNativePixels.end > 0)
             takeNativePixels();
         return parse(mSound, mSyntax, file);
@@ -196,7 +198,7 @@ private:
     {
         int items = 0;
         const qint64 end = mScan.endOfWholeItems(element.value, items);
-        // The first item is the table of offsets.
+        // The first item is the table of offsets. The slice gets an end of its own, for the file's is what is missing.
         if (items < 2 || !take(slice(at, end) + kSequenceEnd))
             return leaveOutFrom(at, QString::fromStdString(element.key.toString()));
         return leaveOutFrom(
@@ -239,6 +241,7 @@ OFCondition readDamagedDicomFile(const char* path, DcmFileFormat& file, QString&
     const OFCondition strict = readDicomFile(path, file);
     QByteArray bytes;
     qint64 at = 0;
+    // What nests too deep is refused here as well: salvage must be no way round a bound.
     if (strict.good() || strict == EC_NestedTooDeep || !readWhole(path, bytes))
         return strict;
     const E_TransferSyntax syntax = passMetaHeader(bytes, at);

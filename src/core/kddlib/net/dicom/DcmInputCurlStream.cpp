@@ -6,7 +6,7 @@ namespace Kdd
 {
 
 DcmInputCurlStream::DcmInputCurlStream(KxCurlDownloadStream&& stream)
-    : DcmInputStream(&mProducer)
+    : DownloadInputStream(mProducer)
     , mProducer(std::move(stream))
 {
 }

@@ -14,7 +14,7 @@ void DcmHttpProducer::request(const std::string& url, const std::string& bearerT
 }
 
 DcmInputHttpStream::DcmInputHttpStream()
-    : DcmInputStream(&mProducer)
+    : DownloadInputStream(mProducer)
 {
 }
 

@@ -1,11 +1,7 @@
 #pragma once
 
-#include "kddlib/net/dicom/DownloadProducer.h"
+#include "kddlib/net/dicom/DownloadInputStream.h"
 #include "platform/base/Export.h"
-
-#include <dcmtk/config/osconfig.h>
-
-#include <dcmtk/dcmdata/dcistrma.h>
 
 #include <string>
 
@@ -21,8 +17,8 @@ public:
     void request(const std::string& url, const std::string& bearerToken);
 };
 
-/// A file of a storage server as DCMTK's parser reads it. As with a download, all values have to be read at once.
-class KDD_EXPORT DcmInputHttpStream : public DcmInputStream
+/// A file of a storage server, asked for by the stream itself, as DCMTK's parser reads it.
+class KDD_EXPORT DcmInputHttpStream : public DownloadInputStream
 {
 public:
     DcmInputHttpStream();
@@ -32,16 +28,6 @@ public:
 
     /// Asks for the object. The stream is in error when that is refused. Throws as `KxCurlClient::read`.
     void request(const char* url) { mProducer.request(url, mBearerToken); }
-
-    /// As in DcmInputCurlStream.
-    static OFBool suspend() { return OFFalse; }
-    DcmInputStreamFactory* newFactory() const override { return nullptr; }
-
-    KxCurlDownloadStream& curlStream() { return mProducer.stream(); }
-
-    /// Bytes handed to the parser, and of the object in all.
-    qint64 bytesRead() const { return mProducer.bytesRead(); }
-    qint64 length() const { return mProducer.length(); }
 
     /// How long was waited for bytes of the body [s].
     float elapsedNetworkTime() const { return static_cast<float>(mProducer.networkTime()) / 1000.0F; }

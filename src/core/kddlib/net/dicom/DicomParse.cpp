@@ -5,6 +5,7 @@ namespace Kdd
 
 OFCondition parseStream(DcmInputStream& stream, DcmFileFormat& file, const ParseOptions& options)
 {
+    // Of a file that could not be opened; what `file` held before stays then.
     OFCondition condition = stream.status();
     if (condition.bad())
         return condition;

@@ -43,6 +43,7 @@ void DownloadProducer::setStream(KxCurlDownloadStream&& stream)
     mWindowStart = 0;
     mPosition = 0;
     mLength = good() ? mStream.contentLength() : 0;
+    // Of length 0 is an object that is empty, and one of which the server does not tell.
     if (good() && mLength == 0)
         fetchAll();
 }
@@ -51,6 +52,7 @@ void DownloadProducer::setStream(KxCurlDownloadStream&& stream)
 void DownloadProducer::fetchAll()
 {
     std::size_t size = 0;
+    // Doubled each time, so that little is copied; what a server says without end stops at the bound.
     while (size < static_cast<std::size_t>(kMaxResponseSize)) {
         mWindow.resize(size + std::max<std::size_t>(size, kWindow));
         const qint64 got = fetch(mWindow.data() + size, static_cast<qint64>(mWindow.size() - size));
@@ -60,6 +62,7 @@ void DownloadProducer::fetchAll()
     }
     mWindow.resize(size);
     mLength = static_cast<qint64>(size);
+    // The parser cannot tell a part from the whole, so a part is given to nobody.
     if (mStream.isOpen() || mStream.httpStatus().failed)
         mStatus = EC_ReadError;
 }
@@ -73,6 +76,7 @@ qint64 DownloadProducer::fetch(char* to, qint64 count)
 offile_off_t DownloadProducer::read(void* bytes, offile_off_t count)
 {
     auto* to = static_cast<char*>(bytes);
+    // Never more than there is: the parser asks for what a length in the data says.
     qint64 left = good() ? std::clamp<qint64>(count, 0, avail()) : 0;
     const qint64 wanted = left;
     while (left > 0) {
@@ -127,6 +131,7 @@ void DownloadProducer::keepHistory(const char* bytes, qint64 count)
 
 offile_off_t DownloadProducer::skip(offile_off_t count)
 {
+    // Read away, for a download cannot be moved in.
     char nowhere[4096];
     qint64 skipped = 0;
     while (skipped < count) {

@@ -75,6 +75,7 @@ qint64 ElementScan::endOf(const Head& head, bool isExplicit, int depth) const
 {
     if (head.length == kUndefined)
         return endOfSequence(head.value, isExplicit && !head.isUnknown, depth);
+    // In 64 bits, where no length that a file can claim wraps.
     const qint64 end = head.value + head.length;
     return end <= mBytes.size() ? end : kNowhere;
 }
@@ -82,6 +83,7 @@ qint64 ElementScan::endOf(const Head& head, bool isExplicit, int depth) const
 qint64 ElementScan::endOfSequence(qint64 at, bool isExplicit, int depth) const
 {
     Head head;
+    // As deep as the parser goes: what lies deeper it would refuse anyway.
     while (at != kNowhere && depth < kMaxItemDepth && readHead(at, isExplicit, head)) {
         if (head.key == DCM_SequenceDelimitationItem || head.key == DCM_ItemDelimitationItem)
             return head.value;

@@ -1,13 +1,13 @@
 #include "kddlib/net/dicom/KxDcmFileLoader.h"
 
 #include "kddlib/net/KxCurlClient.h"
-#include "kddlib/net/cloud/StoragePath.h"
 #include "kddlib/net/dicom/DamagedFile.h"
 #include "kddlib/net/dicom/DcmInputCurlStream.h"
 #include "kddlib/net/dicom/DcmInputHttpStream.h"
 #include "kddlib/net/dicom/DicomParse.h"
 #include "kddlib/net/dicom/ForwardedStream.h"
 #include "kddlib/net/dicom/LocalFileStream.h"
+#include "kddlib/net/dicom/StoragePath.h"
 #include "kddlib/net/http/CurlError.h"
 #include "platform/base/LogFile.h"
 #include "platform/database/Kxg.h"
@@ -44,6 +44,7 @@ struct Settings
 
 Settings& settings()
 {
+    // Never destroyed: threads may still be loading when the process ends.
     static auto* const all = new Settings;
     return *all;
 }
@@ -58,10 +59,8 @@ std::string bearerToken()
 bool isAnswered(const char* name, KxCurlDownloadStream& stream)
 {
     const KxHttpStatus& status = stream.httpStatus();
-    if (status.failed)
-        LogFile::errorf("Reading %s failed: %s", name, status.failure.c_str());
-    else if (!status.ok())
-        LogFile::errorf("Reading %s failed: HTTP response code %d", name, status.code);
+    if (!status.ok())
+        LogFile::errorf("Reading %s failed: %s", name, status.reason().c_str());
     return status.ok();
 }
 
@@ -114,6 +113,7 @@ OFCondition loadLocal(const char* name, DcmFileFormat& file, const ParseOptions&
 {
     DepthLimited<LocalFileStream> stream(name);
     const OFCondition condition = parseDicom(stream, file, options);
+    // A caller's own reader wants a part of the file, and only he knows whether he has got it.
     return condition.good() || options.reader ? condition : readAsRegistered(name, file, condition);
 }
 
@@ -122,6 +122,7 @@ OFCondition load(const char* name, DcmFileFormat& file, Mode mode, ParseOptions 
     const bool isUrl = KxCurlClient::isUrl(name);
     if (mode == Mode::Default)
         mode = KxDcmFileLoader::defaultMode();
+    // A download cannot be read a second time, and the other modes are for callers who want all values.
     if (isUrl || mode != Mode::BoundedLocal)
         options.maxReadLength = kReadAll;
     if (isUrl)

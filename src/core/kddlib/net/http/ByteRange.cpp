@@ -34,18 +34,25 @@ std::string ByteRange::text() const
     return "bytes=" + std::to_string(first) + '-' + std::to_string(last);
 }
 
+std::optional<std::string_view> ContentRange::totalIn(std::string_view value)
+{
+    const std::size_t slash = value.find('/');
+    return slash == kNowhere ? std::nullopt : std::optional(value.substr(slash + 1));
+}
+
 std::optional<ContentRange> ContentRange::parse(std::string_view value)
 {
+    // Strict, for bytes that were put at a guessed place would be taken for the object's own.
     constexpr std::string_view kUnit = "bytes ";
+    const auto totalText = totalIn(value);
     const std::size_t dash = value.find('-');
     const std::size_t slash = value.find('/');
-    if (value.substr(0, kUnit.size()) != kUnit || dash == kNowhere || slash == kNowhere || dash > slash)
+    if (value.substr(0, kUnit.size()) != kUnit || !totalText || dash > slash)
         return std::nullopt;
     const auto first = parseByteCount(value.substr(kUnit.size(), dash - kUnit.size()));
     const auto last = parseByteCount(value.substr(dash + 1, slash - dash - 1));
-    const std::string_view totalText = value.substr(slash + 1);
-    const bool isOpen = totalText == "*";
-    const auto total = isOpen ? std::optional<qint64>(-1) : parseByteCount(totalText);
+    const bool isOpen = *totalText == "*";
+    const auto total = isOpen ? std::optional<qint64>(-1) : parseByteCount(*totalText);
     if (!first || !last || !total || *first > *last || (!isOpen && *last >= *total))
         return std::nullopt;
     // Of an object without a known length: one more byte must still be a number.
@@ -56,6 +63,7 @@ std::optional<ContentRange> ContentRange::parse(std::string_view value)
 
 WantedRange::WantedRange(std::string_view text)
 {
+    // What is of none of the three forms stays Unknown: several ranges, or a server's own unit.
     const std::size_t dash = text.find('-');
     if (dash == kNowhere)
         return;
@@ -74,6 +82,8 @@ WantedRange::WantedRange(std::string_view text)
 bool WantedRange::isAnsweredBy(const ContentRange& answer) const
 {
     const ByteRange& range = answer.range;
+    // Fewer bytes than asked for are right only where the object ends. A server that does not know where
+    // that is has to be believed.
     const bool isToTheEnd = answer.total < 0 || range.last == answer.total - 1;
     switch (mForm) {
     case Closed:

@@ -29,6 +29,9 @@ struct ContentRange
 
     /// Nothing unless the value is of that form, first <= last < total, and each number below 2^63, `last` by one more.
     static std::optional<ContentRange> parse(std::string_view value);
+
+    /// What such a value says in the place of the total, whatever stands before; nothing without a "/".
+    static std::optional<std::string_view> totalIn(std::string_view value);
 };
 
 /// A range as a caller words it: "first-last", "first-" for all from there on, "-count" for the last bytes.

@@ -31,6 +31,7 @@ void CurlOptions::setVerification()
     set(CURLOPT_SSL_VERIFYPEER, verifies ? 1L : 0L);
     set(CURLOPT_SSL_VERIFYHOST, verifies ? 2L : 0L);
     const QByteArray caFile = ExResource::tlsCaFile();
+    // A path that leads nowhere must not break a site that does not verify at all.
     if (verifies && !caFile.isEmpty())
         set(CURLOPT_CAINFO, caFile.constData());
 }
@@ -53,6 +54,7 @@ void CurlOptions::setTransport(const std::string& url, const CurlShare& share,
     set(CURLOPT_SUPPRESS_CONNECT_HEADERS, 1L);
     if (!factory.cipherList().empty())
         set(CURLOPT_SSL_CIPHER_LIST, factory.cipherList().c_str());
+    // Without it each easy handle would trim the connections to curl's own five.
     set(CURLOPT_MAXCONNECTS, factory.connectionLimit());
     set(CURLOPT_SOCKOPTFUNCTION, &prepareSocket);
     set(CURLOPT_LOW_SPEED_LIMIT, kLowSpeed);

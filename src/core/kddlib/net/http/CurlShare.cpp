@@ -23,6 +23,8 @@ CurlShare::CurlShare(Connections connections)
 {
     if (!mHandle)
         throw std::runtime_error("Curl share: out of memory");
+    // First of all: from the first kind that is shared on curl calls them. It holds one of a kind at a time and
+    // lets go of it on the same thread, so plain mutexes do.
     setOption(handle(), CURLSHOPT_LOCKFUNC, &lock);
     setOption(handle(), CURLSHOPT_UNLOCKFUNC, &unlock);
     setOption(handle(), CURLSHOPT_USERDATA, static_cast<void*>(&mMutexes));
@@ -44,6 +46,7 @@ std::mutex* CurlShare::mutexFor(curl_lock_data kind, void* mutexes)
         return &all.tlsSessions;
     case CURL_LOCK_DATA_CONNECT:
         return &all.connections;
+    // Kinds of a later curl are not shared here.
     default:
         return nullptr;
     }

@@ -2,6 +2,7 @@
 
 #include "kddlib/net/http/CurlError.h"
 #include "kddlib/net/http/KxHttpStatus.h"
+#include "kddlib/net/http/LowerCase.h"
 
 #include <string>
 
@@ -14,16 +15,6 @@ void check(CURLcode code)
 {
     if (code != CURLE_OK)
         throw CurlError(code);
-}
-
-std::string lowerCase(std::string_view text)
-{
-    std::string lower(text);
-    for (char& letter : lower) {
-        if (letter >= 'A' && letter <= 'Z')
-            letter = static_cast<char>(letter - 'A' + 'a');
-    }
-    return lower;
 }
 
 /// What follows the colon. The blank there is customary, not required.
@@ -40,6 +31,7 @@ std::string_view valueAfter(std::string_view line, std::size_t colon)
 std::optional<HeaderLine> HeaderLine::parse(std::string_view line)
 {
     constexpr std::size_t kLineEnd = 2;
+    // The empty line that ends the headers is none of them.
     if (line.size() <= kLineEnd || line.substr(line.size() - kLineEnd) != "\r\n")
         return std::nullopt;
     line.remove_suffix(kLineEnd);
@@ -70,6 +62,7 @@ void HeaderReceiver::takeLine(std::string_view line)
     mStarted = true;
     takeCode();
 
+    // What came with an early hint gives way to the answer that follows.
     if (const auto header = HeaderLine::parse(line))
         mStatus.headers[header->name] = header->value;
 }

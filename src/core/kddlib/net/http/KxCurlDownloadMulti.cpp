@@ -37,6 +37,7 @@ KxCurlDownloadRequest::MultiMap::~MultiMap()
 void KxCurlDownloadRequest::MultiMap::add(KxCurlDownloadRequest& request)
 {
     CURL* const easy = request.mEasy.get();
+    // Entered first, so that the limit below counts this one too.
     mRequests[easy] = &request;
     // With fewer than there are requests, each range that ends would close the connection that the next one needs.
     const long limit = std::max(mFactory->connectionLimit(), static_cast<long>(mRequests.size()));
@@ -52,6 +53,7 @@ void KxCurlDownloadRequest::MultiMap::add(KxCurlDownloadRequest& request)
 void KxCurlDownloadRequest::MultiMap::remove(KxCurlDownloadRequest& request)
 {
     CURL* const easy = request.mEasy.get();
+    // The map knows whether it is in: requests end by themselves, are broken off and destroyed, in any order.
     if (mRequests.erase(easy) > 0)
         curl_multi_remove_handle(mMulti.get(), easy);
 }
@@ -60,6 +62,7 @@ void KxCurlDownloadRequest::MultiMap::drive(KxCurlDownloadRequest& reader,
                                             const std::function<bool()>& isEnough)
 {
     mReadSinceDriven = 0;
+    // Without a transfer under way nothing would ever wake the wait.
     int running = 1;
     while (!isEnough() && !reader.isDone() && running > 0) {
         if (!perform(reader, running))
@@ -96,6 +99,7 @@ void KxCurlDownloadRequest::MultiMap::takeCompletions()
     int left = 0;
     while (const CURLMsg* message = curl_multi_info_read(mMulti.get(), &left)) {
         const auto found = mRequests.find(message->easy_handle);
+        // The message goes with the handle, which is taken out in there: its result is passed by value.
         if (message->msg == CURLMSG_DONE && found != mRequests.end())
             found->second->complete(message->data.result);
     }
@@ -103,6 +107,7 @@ void KxCurlDownloadRequest::MultiMap::takeCompletions()
 
 bool KxCurlDownloadRequest::MultiMap::wait(KxCurlDownloadRequest& reader)
 {
+    // Not curl_multi_wait, which comes back at once where there is no socket yet, while a name is looked up.
     const CURLMcode code = curl_multi_poll(mMulti.get(), nullptr, 0, kLongestWait, nullptr);
     if (code == CURLM_OK)
         return true;

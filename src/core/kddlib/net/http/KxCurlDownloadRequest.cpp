@@ -1,5 +1,6 @@
 #include "kddlib/net/http/KxCurlDownloadRequest.h"
 
+#include "kddlib/net/http/HttpAnswer.h"
 #include "platform/base/LogFile.h"
 
 #include <algorithm>
@@ -19,10 +20,6 @@ constexpr std::size_t kSpillCapacity = 1024 * 1024;  // [bytes]
 /// What curl takes from the socket at a time. More than its default of 16 KiB, so that the system is asked less often.
 constexpr long kReceiveBuffer = 256 * 1024;  // [bytes]
 
-constexpr int kOk = 200;
-constexpr int kPartialContent = 206;
-constexpr int kRangeNotSatisfiable = 416;
-
 constexpr char kRangeIgnored[] = "The server sends the whole object where a range was asked for";
 
 /// The range that a header line asks for.
@@ -38,12 +35,6 @@ std::size_t spillCapacity(const std::optional<ByteRange>& range)
 {
     // A range that is fetched ahead of the reader must find room as a whole, else its connection would stand still.
     return range ? std::max(static_cast<std::size_t>(range->length()), kSpillCapacity) : kSpillCapacity;
-}
-
-std::optional<ContentRange> contentRangeOf(const KxHttpStatus& status)
-{
-    const auto found = status.headers.find("content-range");
-    return found == status.headers.end() ? std::nullopt : ContentRange::parse(found->second);
 }
 
 }  // namespace
@@ -147,6 +138,7 @@ bool KxCurlDownloadRequest::resume()
 
 void KxCurlDownloadRequest::abort()
 {
+    // Marked first, so that bytes which curl still offers are refused.
     mAborted = true;
     mDone = true;
     mMulti->remove(*this);
@@ -154,6 +146,7 @@ void KxCurlDownloadRequest::abort()
 
 void KxCurlDownloadRequest::fail(const std::string& reason, const char* what)
 {
+    // What comes after the first fault is its consequence.
     if (mStatus.failed)
         return;
     LogFile::tracef(3, "CURL", "%s: %s", what, reason.c_str());
@@ -174,9 +167,11 @@ void KxCurlDownloadRequest::complete(CURLcode code)
     mMulti->remove(*this);
     if (mAnswer == Answer::Awaited && code == CURLE_OK)
         judgeAnswer();
+    // These ended the transfer themselves: that curl calls it an error says nothing.
     if (mAborted || needsWholeObject() || mAnswer == Answer::Refused)
         return;
     try {
+        // What a callback threw is the cause; curl only knows that the callback gave up.
         mFault.rethrow();
         if (code != CURLE_OK)
             fail(reasonOf(code));
@@ -203,6 +198,7 @@ std::size_t KxCurlDownloadRequest::takeBody(const char* bytes, std::size_t lengt
         judgeAnswer();
     if (mAborted || mAnswer != Answer::Taken)
         return 0;
+    // Bytes beyond it would stand where those of the next range belong.
     if (mPart && mStatus.bytesReceived + length > static_cast<quint64>(mPart->range.length())) {
         refuse("The server sends more than the range that was asked for");
         return 0;
@@ -236,6 +232,7 @@ void KxCurlDownloadRequest::judgeAnswer()
 KxCurlDownloadRequest::Answer KxCurlDownloadRequest::judgeRange()
 {
     const int code = mStatus.code;
+    // Part of the object has been delivered: neither a page that tells of an error nor the whole can follow.
     if (mExpected && code != kPartialContent)
         return refuse("The server answers a later range with code " + std::to_string(code));
     if (code == kOk && mRange->first > 0)
@@ -254,6 +251,7 @@ KxCurlDownloadRequest::Answer KxCurlDownloadRequest::judgeRange()
     if (part->range.first != mRange->first || part->range.last != last)
         return refuse("The server sends " + part->range.text() + " where " + mRange->text() +
                       " was asked for");
+    // Further ranges cannot be planned then. Nothing is lost by asking anew, unless the caller began midway.
     if (part->total < 0)
         return mRange->first == 0 ? Answer::NoRanges
                                   : refuse("The server does not say how long the object is");

@@ -1,5 +1,6 @@
 #include "kddlib/net/http/KxCurlDownloadStreambuf.h"
 
+#include "kddlib/net/http/HttpAnswer.h"
 #include "platform/base/LogFile.h"
 
 #include <algorithm>
@@ -13,11 +14,11 @@ namespace
 {
 
 constexpr std::size_t kGetBufferSize = 16 * 1024;
-constexpr int kPartialContent = 206;
 
 /// Splits what is left into parts of about the length of the first, all equal but for the last.
 qint64 spanOf(qint64 remaining, qint64 first)
 {
+    // To the nearest: no part is longer than one and a half of the first, by which the memory is reckoned.
     const float quotient = static_cast<float>(remaining) / static_cast<float>(first);
     const qint64 parts = std::max<qint64>(1, std::llround(quotient));
     return remaining / parts + (remaining % parts != 0 ? 1 : 0);
@@ -38,8 +39,11 @@ KxCurlDownloadRequest* KxCurlDownloadStreambuf::currentRequest()
     if (mRequests.empty())
         return nullptr;
     KxCurlDownloadRequest& front = *mRequests.front();
+    // It stays in front: nothing may be delivered behind a gap.
     if (front.status().failed)
         return &front;
+    // A request may fail to be made, for want of memory or of a token. To the reader that is a transfer that broke
+    // off, for he may be inside a stream that throws nothing.
     try {
         if (front.needsWholeObject())
             fetchWhole();
@@ -75,8 +79,10 @@ void KxCurlDownloadStreambuf::advance()
 {
     if (mNext < mTotal)
         mRequests.push_back(nextRequest());
+    // The last one stays: its status is that of the download.
     if (mRequests.size() < 2)
         return;
+    // For whoever asks while the next one has no answer yet.
     mFinished = mRequests.front()->status();
     mRequests.pop_front();
 }
@@ -104,6 +110,7 @@ std::streamsize KxCurlDownloadStreambuf::xsgetn(char* to, std::streamsize count)
     if (got > 0)
         std::memcpy(to, gptr(), static_cast<std::size_t>(got));
     gbump(static_cast<int>(got));
+    // Straight into the caller's memory: long reads are not copied twice.
     while (got < count) {
         const std::streamsize more = fetch(to + got, count - got);
         if (more == 0)
@@ -117,6 +124,7 @@ std::streamsize KxCurlDownloadStreambuf::xsgetn(char* to, std::streamsize count)
 std::streamsize KxCurlDownloadStreambuf::fetch(char* to, std::streamsize count)
 {
     while (isOpen()) {
+        // Nothing means that this request is at its end, whereupon the next is in front or none is open.
         const std::size_t got = mRequests.front()->read(to, static_cast<std::size_t>(count));
         if (got > 0)
             return static_cast<std::streamsize>(got);
@@ -159,27 +167,8 @@ qint64 KxCurlDownloadStreambuf::findContentLength()
         LogFile::warnf("Could not get content length. No request object.");
         return 0;
     }
-    if (mPlanned)
-        return mTotal;
-    const auto& headers = request->status().headers;
-    const auto range = headers.find("content-range");
-    if (request->status().code == kPartialContent && range != headers.end()) {
-        const std::size_t slash = range->second.find('/');
-        if (slash == std::string::npos)
-            LogFile::warnf("Could not parse Content-Range: %s", range->second.c_str());
-        else
-            return parseByteCount(std::string_view(range->second).substr(slash + 1)).value_or(0);
-    }
-    const auto length = headers.find("content-length");
-    if (length != headers.end())
-        return parseByteCount(length->second).value_or(0);
-    const auto encoding = headers.find("transfer-encoding");
-    if (encoding != headers.end() && encoding->second == "chunked")
-        return 0;
-    LogFile::warnf("Could not get content length. Received headers:");
-    for (const auto& [name, value] : headers)
-        LogFile::warnf("%s: %s", name.c_str(), value.c_str());
-    return 0;
+    // Of later ranges the answer may not be in yet, and all of them have the total of the first.
+    return mPlanned ? mTotal : objectLengthOf(request->status());
 }
 
 }  // namespace Kdd

@@ -29,6 +29,7 @@ template <typename Handle>
 Handle keep(std::vector<Handle>& pool, std::size_t capacity, Handle handle)
 {
     Handle oldest;
+    // The one that was idle for longest goes: its connections are the likeliest to have been closed.
     if (pool.size() >= capacity) {
         oldest = std::move(pool.front());
         pool.erase(pool.begin());
@@ -80,6 +81,7 @@ CurlMulti KxCurlHandleFactory::takeMulti()
     const std::lock_guard lock(mMutex);
     const bool isReused = !mEasy.empty() && !mMulti.empty();
     CurlMulti handle = isReused ? takeLast(mMulti) : checked(CurlMulti(curl_multi_init()));
+    // Of a reused one, too: the limit may have been changed, or raised for a download, since.
     curl_multi_setopt(handle.get(), CURLMOPT_MAXCONNECTS, connectionLimitLocked());
     return handle;
 }

@@ -39,6 +39,7 @@ KxCurlRequest::~KxCurlRequest()
 
 void KxCurlRequest::perform(const QByteArray& body)
 {
+    // Without a length curl would look for a zero byte. It keeps the pointer, and the bytes outlast the transfer.
     mOptions.set(CURLOPT_POSTFIELDSIZE_LARGE, static_cast<curl_off_t>(body.size()));
     mOptions.set(CURLOPT_POSTFIELDS, body.constData());
     perform();
@@ -59,6 +60,7 @@ void KxCurlRequest::run()
 {
     mOptions.set(CURLOPT_HTTPHEADER, mHeaders.list());
     const CURLcode code = curl_easy_perform(mEasy.get());
+    // What a callback threw is the cause of curl's error, so it comes first.
     mFault.rethrow();
     if (code != CURLE_OK)
         throw CurlError(code, mErrorText.data());
@@ -73,6 +75,7 @@ std::size_t KxCurlRequest::receiveBody(char* bytes, std::size_t size, std::size_
 
 void KxCurlRequest::takeBody(const char* bytes, std::size_t length)
 {
+    // Held against what is left of the bound, because a sum could wrap.
     if (length > static_cast<std::size_t>(kMaxResponseSize - mResponse.size()))
         throw CurlError(CURLE_FILESIZE_EXCEEDED, "The response has a body of more than 1 GiB");
     mResponse.append(bytes, static_cast<int>(length));

@@ -35,6 +35,9 @@ struct KDD_EXPORT KxHttpStatus
     /// A code from 200 to 299, and not failed.
     bool ok() const { return code >= 200 && code <= 299 && !failed; }
 
+    /// Why it is not ok, in words for a message: `failure`, or which code the server answered with. Empty when it is ok.
+    std::string reason() const;
+
     /// The status of no request at all. Any thread may ask for it.
     static const KxHttpStatus& empty();
 };

@@ -1,6 +1,6 @@
 #include "kddlib/net/http/ObjectVersion.h"
 
-#include "kddlib/net/http/KxHttpStatus.h"
+#include "kddlib/net/http/HttpAnswer.h"
 
 namespace Kdd
 {
@@ -9,8 +9,8 @@ namespace
 
 std::string headerOf(const KxHttpStatus& response, const char* name)
 {
-    const auto found = response.headers.find(name);
-    return found == response.headers.end() ? std::string() : found->second;
+    const std::string* const value = findHeader(response, name);
+    return value ? *value : std::string();
 }
 
 }  // namespace

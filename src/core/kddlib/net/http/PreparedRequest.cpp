@@ -1,5 +1,6 @@
 #include "kddlib/net/http/PreparedRequest.h"
 
+#include "kddlib/net/http/ByteRange.h"
 #include "kddlib/net/http/RequestAddress.h"
 #include "kddlib/net/http/WebOrigin.h"
 #include "platform/resources/ExResource.h"
@@ -8,16 +9,14 @@
 #include <QList>
 
 #include <algorithm>
-#include <utility>
 
 namespace Kdd
 {
 namespace
 {
 
-constexpr qint64 kSmallestLastByte = 1024;
-
-/// Whether the site lets the host of a URL know the session.
+/// Whether the site lets the host of a URL know the session. Whoever holds its id acts as the user, and addresses come
+/// from outside.
 bool mayKnowSession(const std::string& url)
 {
     const QByteArray hosts = ExResource::sessionHosts();
@@ -30,27 +29,12 @@ bool mayKnowSession(const std::string& url)
            (known.contains(host) || known.contains(host + ':' + QByteArray::fromStdString(origin.port)));
 }
 
-std::string withSession(const std::string& url, const std::string& id)
-{
-    return id.empty() || !mayKnowSession(url) ? url : withSessionId(url, id);
-}
-
 bool hasSession(const std::string& url, const std::string& id)
 {
     return url.find("?s=" + id) != std::string::npos || url.find("&s=" + id) != std::string::npos;
 }
 
 }  // namespace
-
-std::string authorizationHeader(const ClientSettings& settings)
-{
-    return settings.authorization ? settings.authorization() : std::string();
-}
-
-std::vector<std::string> cloudHeaders(const std::string& authorization)
-{
-    return {authorization, "Host: " + cloudApiHost(), "Cache-Control: no-transform"};
-}
 
 bool isAuthorised(const PreparedRequest& request)
 {
@@ -59,49 +43,25 @@ bool isAuthorised(const PreparedRequest& request)
     });
 }
 
-PreparedRequest prepareRequest(const std::string& address, std::vector<std::string> headers, RequestBody body,
-                               const ClientSettings& settings)
+std::string withSession(const std::string& url, const std::string& id)
 {
-    PreparedRequest request;
-    request.headers = std::move(headers);
-    // Without it curl would wait for the server's leave before it sends a longer body.
-    if (body == RequestBody::Sent)
-        request.headers.emplace_back("Expect: ");
-    if (!isCloudAddress(address)) {
-        request.url = withSession(address, settings.sessionId);
-        return request;
-    }
-    request.url =
-        cloudUrl(address, body == RequestBody::Sent ? CloudEndpoint::Upload : CloudEndpoint::Download);
-    const std::string authorization = authorizationHeader(settings);
-    if (!authorization.empty()) {
-        for (std::string& line : cloudHeaders(authorization))
-            request.headers.push_back(std::move(line));
-    }
-    return request;
+    return id.empty() || !mayKnowSession(url) ? url : withSessionId(url, id);
 }
 
 PreparedRequest redirected(PreparedRequest prepared, const std::string& url, bool isSameOrigin,
-                           const ClientSettings& settings)
+                           const std::string& sessionId)
 {
-    const bool hadSession = hasSession(prepared.url, settings.sessionId);
+    const bool hadSession = hasSession(prepared.url, sessionId);
+    // Named are the lines that may go along, not those that may not: a caller's own may hold a secret as well.
     if (!isSameOrigin) {
         const auto others =
             std::stable_partition(prepared.headers.begin(), prepared.headers.end(), isRangeHeader);
         prepared.headers.erase(others, prepared.headers.end());
     }
     // The server's own answer may bring it along.
-    const bool needsSession = isSameOrigin && hadSession && !hasSession(url, settings.sessionId);
-    prepared.url = needsSession ? withSession(url, settings.sessionId) : url;
+    const bool needsSession = isSameOrigin && hadSession && !hasSession(url, sessionId);
+    prepared.url = needsSession ? withSession(url, sessionId) : url;
     return prepared;
-}
-
-std::optional<ByteRange> firstRange(const ClientSettings& settings, qint64 start)
-{
-    if (settings.numConcurrentRequestsPerFile < 2)
-        return std::nullopt;
-    return ByteRange{start,
-                     start + qMax(qint64(settings.chunkSizeForPartialRequests) - 1, kSmallestLastByte)};
 }
 
 }  // namespace Kdd

@@ -1,25 +1,10 @@
 #pragma once
 
-#include "kddlib/net/http/ByteRange.h"
-
-#include <functional>
-#include <optional>
 #include <string>
 #include <vector>
 
 namespace Kdd
 {
-
-/// What a client's requests follow; a request takes a copy when it is prepared.
-struct ClientSettings
-{
-    std::string sessionId;
-    int numConcurrentRequestsPerFile = 1;
-    int chunkSizeForPartialRequests = 12 * 1024 * 1024;  // [bytes]
-
-    /// Gives the header line "Authorization: ..." for the cloud storage, or nothing. May be empty itself.
-    std::function<std::string()> authorization;
-};
 
 /// A request as it goes out: where to and with which header lines.
 struct PreparedRequest
@@ -28,32 +13,18 @@ struct PreparedRequest
     std::vector<std::string> headers;
 };
 
-/// Whether a request has a body. It decides which host of the cloud storage is asked.
+/// Whether a request has a body.
 enum class RequestBody { None, Sent };
-
-/// Makes the address that a caller gave into a URL and adds what the address asks for to the caller's header lines:
-/// for the cloud storage authorisation, when there is one, for all else the session's id where the host may
-/// know it. Passes on what the
-/// authorisation throws.
-PreparedRequest prepareRequest(const std::string& address, std::vector<std::string> headers, RequestBody body,
-                               const ClientSettings& settings);
-
-/// What `prepared` becomes when a server has redirected it to `url`: of the same origin, with the same header lines and
-/// the session again, if it had one; anywhere else (`isSameOrigin` false) with nothing but the range.
-PreparedRequest redirected(PreparedRequest prepared, const std::string& url, bool isSameOrigin,
-                           const ClientSettings& settings);
 
 /// Whether it carries an authorisation.
 bool isAuthorised(const PreparedRequest& request);
 
-/// What the settings' authorisation gives; empty without one.
-std::string authorizationHeader(const ClientSettings& settings);
+/// `url` with the session `id`, as `withSessionId` has it, where the site lets the host know the session.
+std::string withSession(const std::string& url, const std::string& id);
 
-/// The header lines that requests to the cloud storage carry along with `authorization`.
-std::vector<std::string> cloudHeaders(const std::string& authorization);
-
-/// The first range when an object is fetched in several, from its byte `start` (0-based) on; nothing when it is fetched
-/// in one piece.
-std::optional<ByteRange> firstRange(const ClientSettings& settings, qint64 start = 0);
+/// What `prepared` becomes when a server has redirected it to `url`: of the same origin, with the same header lines and
+/// the session again, if it had one; anywhere else (`isSameOrigin` false) with nothing but the range.
+PreparedRequest redirected(PreparedRequest prepared, const std::string& url, bool isSameOrigin,
+                           const std::string& sessionId);
 
 }  // namespace Kdd

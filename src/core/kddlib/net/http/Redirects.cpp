@@ -1,7 +1,9 @@
 #include "kddlib/net/http/Redirects.h"
 
+#include "kddlib/net/http/HttpAnswer.h"
 #include "kddlib/net/http/KxHttpStatus.h"
 #include "kddlib/net/http/WebOrigin.h"
+#include "platform/base/Result.h"
 
 #include <algorithm>
 #include <iterator>
@@ -15,35 +17,39 @@ constexpr int kMostRedirects = 5;
 
 bool isRedirect(int code)
 {
+    // Not 300, which leaves a choice, nor 304, which leads nowhere.
     constexpr int kCodes[] = {301, 302, 303, 307, 308};
     return std::find(std::begin(kCodes), std::end(kCodes), code) != std::end(kCodes);
 }
 
-}  // namespace
-
-Redirects::Answer Redirects::take(const KxHttpStatus& status)
+Result refusal(const std::string& whereTo)
 {
-    const auto location = status.headers.find("location");
-    if (status.failed || !isRedirect(status.code) || location == status.headers.end())
-        return Answer::Final;
-    if (++mCount > kMostRedirects)
-        return refuse("The server redirects more than " + std::to_string(kMostRedirects) + " times");
-    const std::string url = resolvedUrl(mUrl, location->second);
-    const WebOrigin from = originOf(mUrl);
-    const WebOrigin to = originOf(url);
-    if (!to.isValid())
-        return refuse("The server redirects to \"" + location->second + "\", which is no address of HTTP");
-    if (from.scheme == "https" && to.scheme == "http")
-        return refuse("The server redirects from HTTPS to \"" + url + "\"");
-    mHasLeft |= !(from == to);
-    mUrl = url;
-    return Answer::GoOn;
+    return Result::failure(QString::fromStdString("The server redirects " + whereTo));
 }
 
-Redirects::Answer Redirects::refuse(const std::string& reason)
+}  // namespace
+
+bool Redirects::follow(const KxHttpStatus& status, Result& result)
 {
-    mFault = reason;
-    return Answer::Refused;
+    const std::string* const location = findHeader(status, "location");
+    if (status.failed || !isRedirect(status.code) || !location)
+        return false;
+    // Against the page that answered, not the first address: a server may name a path only.
+    const std::string url = resolvedUrl(mUrl, *location);
+    const WebOrigin from = originOf(mUrl);
+    const WebOrigin to = originOf(url);
+    if (++mCount > kMostRedirects)
+        result = refusal("more than " + std::to_string(kMostRedirects) + " times");
+    else if (!to.isValid())
+        result = refusal("to \"" + *location + "\", which is no address of HTTP");
+    else if (leavesTls(from, to))
+        result = refusal("from HTTPS to \"" + url + "\"");
+    if (result.bad())
+        return false;
+    // Never taken back: a way home that another server chose is not to be trusted.
+    mHasLeft |= !(from == to);
+    mUrl = url;
+    return true;
 }
 
 }  // namespace Kdd

@@ -39,12 +39,14 @@ std::size_t SpillBuffer::take(char* to, std::size_t count)
         left -= part;
         mBegin += part;
         if (mBegin == SpillBlocks::kBlockSize) {
+            // At once, so that the next request takes this memory instead of new.
             mBlocks.giveBack(std::move(mHeld.front()));
             mHeld.pop_front();
             mBegin = 0;
             mEnd -= SpillBlocks::kBlockSize;
         }
     }
+    // The next bytes begin a block again, so that the last one is not held for a few of them.
     if (isEmpty())
         clear();
     return wanted;

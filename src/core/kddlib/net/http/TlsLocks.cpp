@@ -88,6 +88,7 @@ void installTlsLocks(const std::string& curlTlsVersion, CryptoLibrary& library)
         LogFile::printf("SSL locking callbacks not installed because the SSL library does not need them.");
         return;
     }
+    // The host program has threads in the library already, which hold its locks.
     if (library.hasLockingCallback()) {
         LogFile::printf("SSL locking callbacks not installed because there are callbacks already installed.");
         return;

@@ -1,5 +1,7 @@
 #include "kddlib/net/http/WebOrigin.h"
 
+#include "kddlib/net/http/LowerCase.h"
+
 #include <curl/curl.h>
 
 #include <memory>
@@ -29,15 +31,6 @@ std::string partOf(const Url& url, CURLUPart part, unsigned int flags = 0)
     return code == CURLUE_OK && text ? std::string(text) : std::string();
 }
 
-std::string lowerCase(std::string text)
-{
-    for (char& letter : text) {
-        if (letter >= 'A' && letter <= 'Z')
-            letter = static_cast<char>(letter - 'A' + 'a');
-    }
-    return text;
-}
-
 }  // namespace
 
 WebOrigin originOf(const std::string& url)
@@ -45,6 +38,7 @@ WebOrigin originOf(const std::string& url)
     const Url parts(curl_url());
     if (!parts || curl_url_set(parts.get(), CURLUPART_URL, url.c_str(), 0) != CURLUE_OK)
         return {};
+    // With the usual port named, so that an address with it and one without are one origin.
     WebOrigin origin = {lowerCase(partOf(parts, CURLUPART_SCHEME)), lowerCase(partOf(parts, CURLUPART_HOST)),
                         partOf(parts, CURLUPART_PORT, CURLU_DEFAULT_PORT)};
     const bool isWeb = origin.scheme == "http" || origin.scheme == "https";

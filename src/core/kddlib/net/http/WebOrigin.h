@@ -20,6 +20,12 @@ struct WebOrigin
     }
 };
 
+/// Whether what goes over TLS now would go open from there on, where everybody on the way can read and change it.
+inline bool leavesTls(const WebOrigin& from, const WebOrigin& to)
+{
+    return from.scheme == "https" && to.scheme == "http";
+}
+
 WebOrigin originOf(const std::string& url);
 
 /// `reference` as a server names it in answer to a request to `base`: a URL, or what differs from `base`. Empty when

@@ -69,15 +69,16 @@ TEST_P(DownloadFrom, GivesEveryByteWithAnyNumberOfRanges)
     const NginxServer server(GetParam().scheme, GetParam().directives);
     const QByteArray object = someObject(1'234'567);
     server.addFile("object", object);
-    for (const int count : {1, 2, 3, 8}) {
+    for (const int count : {1, 2, 8}) {
         fetchInRanges(count, 100'000);
         KxCurlDownloadStream stream = client.read(server.url("object"), true);
         EXPECT_EQ(stream.contentLength(), GetParam().tellsLength ? object.size() : 0);
         EXPECT_EQ(readAll(stream), object) << count;
         EXPECT_TRUE(stream.httpStatus().ok());
         EXPECT_FALSE(stream.isOpen());
-        KxHttpStatus status;
-        EXPECT_EQ(client.readBytes(server.url("object"), status), object) << count;
+        KxCurlDownloadStream page = client.read(server.url("absent"), true);
+        EXPECT_THAT(readAll(page).toStdString(), HasSubstr("404 Not Found"));
+        EXPECT_EQ(page.httpStatus().reason(), "HTTP response code 404");
     }
 }
 
@@ -159,8 +160,8 @@ TEST_F(Download, NeverGivesAWrongByteWhateverFaultsComeTogether)
             answer.code = 500;
     });
     int complete = 0;
-    for (int run = 0; run < 200; ++run) {
-        fetchInRanges(2 + run % 6, 1500 + 100 * run);
+    for (int run = 0; run < 60; ++run) {
+        fetchInRanges(2 + run % 6, 1500 + 300 * run);
         KxCurlDownloadStream stream = client.read(server.url(), true);
         const QByteArray got = readAll(stream);
         const KxHttpStatus status = stream.httpStatus();
@@ -168,8 +169,8 @@ TEST_F(Download, NeverGivesAWrongByteWhateverFaultsComeTogether)
         EXPECT_TRUE(object.startsWith(got) || status.code / 100 != 2) << run;
         complete += status.ok() ? 1 : 0;
     }
-    EXPECT_GT(complete, 20);
-    EXPECT_LT(complete, 180);
+    EXPECT_GT(complete, 6);
+    EXPECT_LT(complete, 54);
 }
 
 TEST_F(Download, FetchesAnewInOnePieceWhatHasNoKnownLength)
@@ -215,18 +216,6 @@ TEST_F(Download, HasAsManyRequestsUnderWayAsItMay)
     EXPECT_TRUE(stream.httpStatus().ok());
 }
 
-TEST_F(Download, StopsWhereItIsClosed)
-{
-    const ObjectServer server(someObject(40'000));
-    fetchInRanges(4, 2000);
-    KxCurlDownloadStream stream = client.read(server.url(), true);
-    stream.ignore(2001);
-    stream.close();
-    EXPECT_FALSE(stream.isOpen());
-    EXPECT_EQ(stream.httpStatus().code, 206);
-    EXPECT_EQ(stream.get(), EOF);
-}
-
 TEST_F(Download, KeepsTheCallersRange)
 {
     fetchInRanges(4, 2000);  // which is for whole objects
@@ -268,16 +257,6 @@ TEST_F(Download, FailsWhenTheServerSendsTheWholeForARange)
     }
 }
 
-TEST_F(Download, OfAnErrorGivesThePageAndTheCode)
-{
-    fetchInRanges(4, 2000);
-    const NginxServer nginx;
-    KxCurlDownloadStream stream = client.read(nginx.url("absent"), true);
-    EXPECT_EQ(stream.httpStatus().code, 404);
-    EXPECT_THAT(readAll(stream).toStdString(), HasSubstr("404 Not Found"));
-    EXPECT_FALSE(stream.httpStatus().failed);
-}
-
 TEST_F(Download, CanBeMovedAndBrokenOffAtAnyPlace)
 {
     const QByteArray object = someObject(3'000'000);
@@ -294,8 +273,13 @@ TEST_F(Download, CanBeMovedAndBrokenOffAtAnyPlace)
         kept = std::move(stream);  // which ends the one before
         EXPECT_FALSE(stream.isOpen());
     }
-    EXPECT_EQ(readAll(kept), object.mid(700'000));
-    EXPECT_TRUE(kept.httpStatus().ok());
+    QByteArray rest(1'000'000, '\0');
+    kept.read(rest.data(), rest.size());
+    EXPECT_EQ(rest, object.mid(700'000, rest.size()));
+    kept.close();
+    EXPECT_FALSE(kept.isOpen());
+    EXPECT_EQ(kept.httpStatus().code, 206);
+    EXPECT_EQ(kept.get(), EOF);
 }
 
 }  // namespace

@@ -2,8 +2,8 @@
 
 #include "kddlib/net/dicom/DicomFileReader.h"
 #include "support/DatasetBuilder.h"
+#include "support/Files.h"
 
-#include <QFile>
 #include <QTemporaryDir>
 
 #include <gmock/gmock.h>
@@ -33,8 +33,7 @@ QByteArray soundFile(E_EncodingType lengths = EET_UndefinedLength)
     EXPECT_TRUE(
         file.saveFile(path.toLocal8Bit().constData(), EXS_LittleEndianExplicit, lengths, EGL_withoutGL)
             .good());
-    QFile written(path);
-    return written.open(QIODevice::ReadOnly) ? written.readAll() : QByteArray();
+    return contentOf(path);
 }
 
 QByteArray declaredAsRle(QByteArray file)
@@ -89,9 +88,9 @@ class DamagedFile : public testing::Test
 protected:
     QByteArray put(const QByteArray& content) const
     {
-        QFile file(mFolder.filePath(QStringLiteral("file")));
-        EXPECT_TRUE(file.open(QIODevice::WriteOnly) && file.write(content) == content.size());
-        return file.fileName().toLocal8Bit();
+        const QString path = mFolder.filePath(QStringLiteral("file"));
+        writeFile(path, content);
+        return path.toLocal8Bit();
     }
 
     QTemporaryDir mFolder;
@@ -120,14 +119,14 @@ TEST_F(DamagedFile, IsRefusedAsBeforeWhereverItIsCutBeforeItNamesItself)
     DcmFileFormat file;
     QString leftOut;
     int taken = 0;
-    for (int length = 0; length < sound.size(); length += length < 500 ? 1 : 61) {
+    for (int length = 0; length < sound.size(); length += length < 500 ? 1 : 301) {
         const QByteArray path = put(sound.left(length));
         const bool isTaken = readDicomFile(path.constData(), file).bad() &&
                              readDamagedDicomFile(path.constData(), file, leftOut).good();
         taken += isTaken ? 1 : 0;
         EXPECT_TRUE(!isTaken || file.getDataset()->tagExistsWithValue(DCM_SeriesInstanceUID)) << length;
     }
-    EXPECT_GT(taken, 20) << "the long text";
+    EXPECT_GT(taken, 4) << "the long text";
     EXPECT_TRUE(readDamagedDicomFile(put(sound).constData(), file, leftOut).good());
     EXPECT_TRUE(leftOut.isEmpty()) << "nothing is wrong with it";
 }

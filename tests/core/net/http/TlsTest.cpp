@@ -3,6 +3,8 @@
 #include "kddlib/net/http/TlsLocks.h"
 #include "support/HttpServer.h"
 #include "support/LogCapture.h"
+#include "support/Setting.h"
+#include "support/Threads.h"
 
 #include <gtest/gtest.h>
 
@@ -14,11 +16,6 @@ namespace
 class Verification : public testing::Test
 {
 protected:
-    ~Verification() override
-    {
-        qunsetenv("KDD_TLS_VERIFY");
-        qunsetenv("KDD_TLS_CA_FILE");
-    }
     bool reads(const std::string& url)
     {
         KxHttpStatus status;
@@ -35,12 +32,12 @@ TEST_F(Verification, IsOffUntilTheSiteAsksForItAndThenHoldsForOpenConnectionsToo
     byAddress.replace(byAddress.find("localhost"), 9, "127.0.0.1");
     EXPECT_TRUE(reads(server.url("")));
     EXPECT_TRUE(reads(byAddress));
-    qputenv("KDD_TLS_VERIFY", "1");
+    const Setting verification("KDD_TLS_VERIFY", "1");
     EXPECT_FALSE(reads(server.url("")));
-    qputenv("KDD_TLS_CA_FILE", server.certificateFile());
+    Setting authority("KDD_TLS_CA_FILE", server.certificateFile().constData());
     EXPECT_TRUE(reads(server.url("")));
     EXPECT_FALSE(reads(byAddress));  // a certificate for another name
-    qputenv("KDD_TLS_CA_FILE", "/absent.pem");
+    authority.set("/absent.pem");
     EXPECT_FALSE(reads(server.url("")));
     EXPECT_EQ(log.count("certificate"), 3);
 }
@@ -100,7 +97,7 @@ TEST(TlsLocks, KeepThreadsApart)
     OldLibrary library;
     installTlsLocks("OpenSSL/1.0.2k", library);
     int count = 0;
-    const auto countUp = [&] {
+    onThreads(2, [&](int) {
         for (int i = 0; i < 2000; ++i) {
             library.callback(1 | 8, 1, nullptr, 0);
             const int before = count;
@@ -108,10 +105,7 @@ TEST(TlsLocks, KeepThreadsApart)
             count = before + 1;
             library.callback(2 | 8, 1, nullptr, 0);
         }
-    };
-    std::thread other(countUp);
-    countUp();
-    other.join();
+    });
     EXPECT_EQ(count, 4000);
 }
 

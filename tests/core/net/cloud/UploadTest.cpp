@@ -4,6 +4,7 @@
 #include "kddlib/net/http/CurlShare.h"
 #include "support/CloudStore.h"
 #include "support/LogCapture.h"
+#include "support/ObjectServer.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -25,14 +26,6 @@ const Fault kNone = {};
 const Fault kUnavailable = {0, "503 Busy"};
 const Fault kReset = {0, {}, true};
 const Fault kLostAnswer = {kAll, {}, true};
-
-QByteArray bytesOf(int size)
-{
-    std::mt19937 engine(static_cast<unsigned>(size));
-    QByteArray bytes(size, '\0');
-    std::generate(bytes.begin(), bytes.end(), [&] { return static_cast<char>(engine()); });
-    return bytes;
-}
 
 class Upload : public testing::Test
 {
@@ -92,7 +85,7 @@ TEST(Crc32c, IsThatOfTheStandardAndMayBeContinued)
 {
     EXPECT_EQ(crc32c("123456789"), 0xE3069283U);
     EXPECT_EQ(crc32c(QByteArray(32, '\xFF')), 0x62A8AB43U);
-    const QByteArray bytes = bytesOf(100);
+    const QByteArray bytes = someObject(100);
     for (int i = 0; i <= bytes.size(); ++i)
         EXPECT_EQ(crc32c(bytes.mid(i), crc32c(bytes.left(i))), crc32c(bytes));
 }
@@ -112,7 +105,7 @@ TEST(RetryPolicy, WaitsTwiceAsLongEachTimeAndGivesUpAfterFiveFailures)
 
 TEST_F(Upload, SendsWholeChunksAndThenTheRest)
 {
-    const QByteArray bytes = bytesOf(4 * kStep - 1);
+    const QByteArray bytes = someObject(4 * kStep - 1);
     KxCurlUploadStream stream = open();
     write(stream, bytes.left(kStep + 7));
     stream.flush();
@@ -122,10 +115,10 @@ TEST_F(Upload, SendsWholeChunksAndThenTheRest)
     EXPECT_TRUE(stream.good() && !stream.isOpen());
     EXPECT_EQ(store.object("b/o"), bytes);
     ASSERT_EQ(store.requests().size(), 4U);
-    EXPECT_TRUE(request(0).contains("\r\nAuthorization: Bearer t\r\n"));
-    EXPECT_TRUE(request(1).contains("\r\nContent-Range: bytes 0-262143/*\r\n"));
-    EXPECT_TRUE(request(2).contains("\r\nContent-Range: bytes 262144-786431/*\r\n"));
-    EXPECT_TRUE(request(3).contains("\r\nContent-Range: bytes 786432-1048574/1048575\r\n"));
+    EXPECT_EQ(headerOf(request(0), "Authorization"), "Bearer t");
+    EXPECT_EQ(headerOf(request(1), "Content-Range"), "bytes 0-262143/*");
+    EXPECT_EQ(headerOf(request(2), "Content-Range"), "bytes 262144-786431/*");
+    EXPECT_EQ(headerOf(request(3), "Content-Range"), "bytes 786432-1048574/1048575");
     EXPECT_FALSE(request(1).contains("Expect:") || request(1).contains("Content-Type:"));
 }
 
@@ -148,12 +141,12 @@ TEST_F(Upload, GoesOnWithTheStreamThatItWasMovedTo)
 TEST_F(Upload, MakesNoObjectWhenItIsAbandonedOrAPartWasLost)
 {
     KxCurlUploadStream stream = open();
-    write(stream, bytesOf(kStep));
+    write(stream, someObject(kStep));
     stream.abandon();
     EXPECT_FALSE(stream.isOpen());
     KxCurlUploadStream other = open();
     store.misbehave({{0, "404 Gone"}});
-    write(other, bytesOf(kStep));
+    write(other, someObject(kStep));
     other.flush();
     EXPECT_TRUE(other.bad());
     other.clear();
@@ -196,13 +189,11 @@ const Trouble kTroubles[] = {
     {"AnswerIsLost", {kNone, kLostAnswer}, 1},
     {"ResetMidway", {kNone, {kStep, {}, true}}, 1},
     {"UnavailableButStored", {kNone, {kStep, "503 Busy"}}, 1},
-    {"TooManyRequests", {kNone, {0, "429 Slow down"}}, 1},
     {"NothingTaken", {kNone, {0}}, 1},
     {"PositionNotTold", {kNone, {kStep, "308 Go on"}}, 1},
     {"PositionNeverTold", {kNone, {kStep, "308 Go on"}, {0, "308 Go on"}}, 1},
     {"PositionAskedForInVain", {kNone, kLostAnswer, kUnavailable, kReset}, 3},
     {"AnswerToTheLastIsLost", {kNone, kNone, kLostAnswer}, 1},
-    {"AnswersToTheLastAreLost", {kNone, kNone, kLostAnswer, kLostAnswer}, 2},
     {"LastIsStoredButNotEnded", {kNone, kNone, {100}}, 0},
     {"LastIsAnsweredByCreated", {kNone, kNone, {kAll, "201 Created"}}, 0},
     {"OtherAddressOnTheWay", {kNone, {kAll, "308 Go on\r\nRange: bytes=0-524287\r\nLocation: /upload0"}}, 0},
@@ -213,8 +204,11 @@ const Trouble kTroubles[] = {
     {"AddressOfAFile", {{0, "201 Created\r\nLocation: file:///etc/passwd"}}, 0, "file:///etc/passwd"},
     {"SessionExpired", {kNone, {kStep, "404 Not Found"}}, 0, kNoUse},
     {"SessionGone", forEver({0, "410 Gone"}), 4, kResetExhausted},
-    {"AlwaysUnavailable", forEver(kUnavailable), 4, kResetExhausted},
     {"AlwaysReset", forEver(kReset), 4, kResetExhausted},
+    {"EveryChunkIsReset",
+     {kNone, kReset, kNone, kReset, kNone, kReset, kNone, kReset, kNone, kReset},
+     4,
+     kResetExhausted},
     {"NothingEverTaken", forEver({0}), 4, kChunkExhausted},
     {"OneByteAtATime", forEver({1}), 4, kChunkExhausted},
     {"RunsAhead", {kNone, {kStep, "308 Go on\r\nRange: bytes=0-524288"}}, 0, "bytes=0-524288"},
@@ -223,7 +217,7 @@ const Trouble kTroubles[] = {
     {"GoesBack", {kNone, {kStep}, {0, "308 Go on\r\nRange: bytes=0-99"}}, 0, "after 262144 bytes"},
     {"LosesAChunk", {kNone, kNone, {0, "308 Go on\r\nRange: bytes=0-99"}}, 0, "after 524288 bytes"},
     {"EndsBeforeTheLast", {kNone, {kStep, "200 OK"}}, 0, "ended the upload before the last"},
-    {"OtherMd5", atTheEnd("200 OK\r\nx-goog-hash: crc32c=oSfDNw==,md5=1B2M2Y8AsgTpgAmY7PhCfg=="), 0,
+    {"OtherMd5", atTheEnd("200 OK\r\nx-goog-hash: crc32c=b+GY5g==,md5=1B2M2Y8AsgTpgAmY7PhCfg=="), 0,
      "md5 1B2M"},
     {"OtherCrc", atTheEnd("200 OK\r\nx-goog-hash: crc32c=AAAAAA=="), 0, "crc32c AAAAAA== instead of "},
     {"OtherLengthInJson", atTheEnd("200 OK\r\n\r\n{\"size\": \"5\"}"), 0, "length 5 instead of 524388"},
@@ -236,7 +230,7 @@ class TroubledUpload : public Upload, public testing::WithParamInterface<Trouble
 
 TEST_P(TroubledUpload, EitherLosesNothingOrSaysWhyItEnded)
 {
-    const QByteArray bytes = bytesOf(2 * kStep + 100);
+    const QByteArray bytes = someObject(2 * kStep + 100);
     const bool heals = GetParam().error[0] == '\0';
     store.misbehave(GetParam().faults);
     const std::string error = upload(bytes);
@@ -257,7 +251,7 @@ TEST_F(Upload, TriesAgainWhenThereIsNoTokenForAMoment)
     EXPECT_EQ(store.object("b/o"), "bytes");
     EXPECT_EQ(waits.size(), 1U);
     for (const QByteArray& sent : store.requests())
-        EXPECT_TRUE(sent.contains("\r\nAuthorization: Bearer t\r\n"));
+        EXPECT_EQ(headerOf(sent, "Authorization"), "Bearer t");
 }
 
 TEST_F(Upload, LogsErrorsInTheirOwnLinesAndLeavesTheLastToTheCallerOnRequest)
@@ -279,22 +273,15 @@ TEST_F(Upload, LogsErrorsInTheirOwnLinesAndLeavesTheLastToTheCallerOnRequest)
 
 TEST_F(Upload, KeepsTheAuthorizationFromOtherHosts)
 {
-    const ScriptedServer other([](const QByteArray&) {
-        return ScriptedServer::Reply{"HTTP/1.1 200 OK\r\nConnection: close\r\n\r\n"};
-    });
+    const ScriptedServer other(httpResponse({}));
     store.misbehave({{0, "201 Created\r\nLocation: " + QByteArray::fromStdString(other.url("s"))}});
     EXPECT_EQ(upload("bytes"), "");
     EXPECT_TRUE(other.requests().at(0).endsWith("\r\n\r\nbytes"));
     EXPECT_FALSE(other.requests().at(0).contains("Authorization"));
-    EXPECT_TRUE(other.requests().at(0).contains(
-        "Host: " + QByteArray::fromStdString(other.url("").substr(7)).chopped(1)));
-}
-
-TEST_F(Upload, DoesNotLeaveHttps)
-{
+    EXPECT_EQ("http://" + headerOf(other.requests().at(0), "Host") + '/', other.url("").c_str());
     const NginxServer secure(NginxServer::Scheme::Https,
                              "location / { add_header Location http://127.0.0.1:1/s; return 201; }");
-    EXPECT_THAT(upload("bytes", secure.url("b/o")), HasSubstr("http://127.0.0.1:1/s"));
+    EXPECT_THAT(upload("bytes", secure.url("b/o")), HasSubstr("http://127.0.0.1:1/s")) << "from HTTPS";
 }
 
 /// Faults that an upload may meet, few of them beyond healing.
@@ -313,24 +300,21 @@ TEST_F(Upload, IsWholeWheneverItSaysSo)
     std::mt19937 engine{1};
     pieceSize = [&] { return static_cast<int>(1 + engine() % (2 * kStep)); };
     flushes = [&] { return engine() % 4 == 0; };
-    std::map<std::string, int> outcomes;  // by the first words of the error
-    for (int run = 0; run < 100; ++run) {
+    int complete = 0;
+    for (int run = 0; run < 40; ++run) {
         CloudStore stage;
         capacity = kStep * static_cast<int>(1 + engine() % 3);
-        const QByteArray bytes = bytesOf(static_cast<int>(engine() % (5 * kStep)));
+        const QByteArray bytes = someObject(static_cast<int>(engine() % (5 * kStep)));
         std::vector<Fault> faults(engine() % 20);
         std::generate(faults.begin(), faults.end(), [&] { return randomFault(engine); });
         stage.misbehave(faults);
         const std::string error = upload(bytes, stage.url("b/o"));
         EXPECT_THAT(stage.complaints(), testing::IsEmpty()) << run;
         EXPECT_TRUE(!error.empty() || stage.object("b/o") == bytes) << run;
-        ++outcomes[error.substr(0, error.find(' ', 10))];
+        complete += error.empty() ? 1 : 0;
     }
-    EXPECT_GT(outcomes[""], 25);
-    for (const auto& [words, count] : outcomes)
-        EXPECT_THAT(words, testing::AnyOf("", "HTTP code 404indicates", "Retry policy", "The cloud storage",
-                                          "The object"))
-            << count;
+    EXPECT_GT(complete, 10);
+    EXPECT_LT(complete, 39);
 }
 
 }  // namespace

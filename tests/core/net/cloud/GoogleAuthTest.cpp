@@ -3,10 +3,12 @@
 #include "kddlib/net/cloud/KxGoogleAuth.h"
 #include "kddlib/net/http/KxHttpStatus.h"
 #include "support/CloudStore.h"
+#include "support/Files.h"
 #include "support/LogCapture.h"
 #include "support/ObjectServer.h"
+#include "support/Setting.h"
+#include "support/Threads.h"
 
-#include <QFile>
 #include <QFileInfo>
 #include <QJsonDocument>
 #include <QJsonObject>
@@ -48,25 +50,19 @@ public:
                 {QStringLiteral("token_uri"), QString::fromStdString(tokenUri)}};
     }
 
-    /// Runs a program in the folder of the keys; what it says when it succeeds.
-    QByteArray run(const char* program, const QStringList& arguments) const
+    /// Runs the tool in the folder of the keys; what it says when it succeeds.
+    QByteArray openssl(const char* arguments) const
     {
         QProcess process;
         process.setWorkingDirectory(mFolder.path());
-        process.start(QLatin1String(program), arguments);
+        process.start(QStringLiteral("openssl"), QString::fromLatin1(arguments).split(QLatin1Char(' ')));
         const bool isDone = process.waitForFinished() && process.exitCode() == 0;
         return isDone ? process.readAllStandardOutput().trimmed() : QByteArray("failed");
     }
 
-    QByteArray openssl(const char* arguments) const
-    {
-        return run("openssl", QString::fromLatin1(arguments).split(QLatin1Char(' ')));
-    }
-
     void save(const char* name, const QByteArray& content) const
     {
-        QFile file(mFolder.filePath(QLatin1String(name)));
-        EXPECT_TRUE(file.open(QIODevice::WriteOnly) && file.write(content) == content.size());
+        writeFile(mFolder.filePath(QLatin1String(name)), content);
     }
 
 private:
@@ -85,22 +81,31 @@ QJsonObject with(QJsonObject key, const char* field, const QByteArray& value)
     return key;
 }
 
+/// What a place of tokens was sent and what it answers.
 class GoogleAuth : public testing::Test
 {
 protected:
-    ~GoogleAuth() override { qunsetenv("GOOGLE_APPLICATION_CREDENTIALS"); }
+    static QJsonObject key() { return account().key("http://tokens/a"); }
 
-    QJsonObject key() const { return account().key(server.url("token")); }
-    QByteArray header() { return auth.authorizationHeader(KxCurlClient::instance()); }
-
-    /// What the last request asserts.
-    QByteArray token() const
+    QByteArray header()
     {
-        const QByteArray body = server.requests().back().split('\n').last();
+        return auth.authorizationHeader([this](const std::string& url, const QByteArray& form, auto& result) {
+            const std::lock_guard lock(mutex);
+            asked.push_back({url, form});
+            result = status;
+            return QJsonDocument::fromJson(answer);
+        });
+    }
+
+    /// A part of what the last form asserts.
+    QByteArray token(int part) const
+    {
         const QByteArray start =
             "grant_type=urn%3Aietf%3Aparams%3Aoauth%3Agrant-type%3Ajwt-bearer&assertion=";
-        EXPECT_TRUE(body.startsWith(start)) << body.toStdString();
-        return body.mid(start.size());
+        const QByteArray form = asked.back().second;
+        EXPECT_TRUE(form.startsWith(start)) << form.constData();
+        EXPECT_FALSE(form.mid(start.size()).contains('='));
+        return form.mid(start.size()).split('.').value(part);
     }
 
     static QByteArray decoded(const QByteArray& text)
@@ -110,48 +115,28 @@ protected:
 
     qint64 now = 1'700'000'000 * kSecond + 9'999'999;
     KxGoogleAuth auth{[this] { return now; }};
-    QByteArray code = "200 OK";
+    KxHttpStatus status = {200, {}};
     QByteArray answer = R"({"access_token":"t.1","token_type":"Bearer","expires_in":3600})";
-    ScriptedServer server{[this](const QByteArray&) -> ScriptedServer::Reply {
-        return {"HTTP/1.1 " + code + "\r\nContent-Length: " + QByteArray::number(answer.size()) + "\r\n\r\n" +
-                answer};
-    }};
+    std::mutex mutex;
+    std::vector<std::pair<std::string, QByteArray>> asked;
 };
 
 TEST_F(GoogleAuth, AssertsWhoItIsWithASignatureThatOpensslVerifies)
 {
     ASSERT_TRUE(auth.loadCredentialsFromJson(key(), "test"));
     EXPECT_EQ(header(), "Authorization: Bearer t.1");
-    EXPECT_TRUE(server.requests().back().contains("\r\nContent-Type: application/x-www-form-urlencoded\r\n"));
-    const QList<QByteArray> parts = token().split('.');
-    ASSERT_EQ(parts.size(), 3);
-    EXPECT_FALSE(token().contains('='));
-    EXPECT_EQ(decoded(parts[0]), R"({"alg":"RS256","kid":"k1","typ":"JWT"})");
-    EXPECT_EQ(decoded(parts[1]), R"({"aud":")" + QByteArray::fromStdString(server.url("token")) +
-                                     R"(","exp":1700003600,"iat":1700000000,"iss":"robot@hospital",)"
-                                     R"("scope":"https://www.googleapis.com/auth/cloud-platform"})");
-    account().save("text", parts[0] + '.' + parts[1]);
-    account().save("signature", decoded(parts[2]));
+    EXPECT_EQ(asked.back().first, "http://tokens/a");
+    EXPECT_EQ(decoded(token(0)), R"({"alg":"RS256","kid":"k1","typ":"JWT"})");
+    EXPECT_EQ(decoded(token(1)),
+              R"({"aud":"http://tokens/a","exp":1700003600,"iat":1700000000,"iss":"robot@hospital",)"
+              R"("scope":"https://www.googleapis.com/auth/cloud-platform"})");
+    account().save("text", token(0) + '.' + token(1));
+    account().save("signature", decoded(token(2)));
     EXPECT_EQ(account().openssl("dgst -sha256 -verify public.pem -signature signature text"), "Verified OK");
-}
-
-TEST_F(GoogleAuth, AssertsWhatAnotherImplementationAccepts)
-{
-    const char* const program = "/usr/bin/python3";
-    if (account().run(program, {QStringLiteral("-c"), QStringLiteral("import jwt, cryptography")}) ==
-        "failed")
-        GTEST_SKIP() << "No python3-jwt";
-    ASSERT_TRUE(auth.loadCredentialsFromJson(key(), "test"));
     auth.setScopes({"read", "write"});
     auth.setSubject("jos\xC3\xA9@hospital");
     header();
-    const QString script = QStringLiteral(
-        "import jwt, sys; claims = jwt.decode(sys.argv[1], open('public.pem').read(), algorithms=['RS256'],"
-        " audience=sys.argv[2], options={'verify_exp': False}); print(ascii([claims['scope'], "
-        "claims['sub']]))");
-    EXPECT_EQ(account().run(program, {QStringLiteral("-c"), script, QString::fromLatin1(token()),
-                                      QString::fromStdString(server.url("token"))}),
-              "['read write', 'jos\\xe9@hospital']");
+    EXPECT_TRUE(decoded(token(1)).contains("\"scope\":\"read write\",\"sub\":\"jos\xC3\xA9@hospital\""));
 }
 
 TEST_F(GoogleAuth, KeepsATokenUntil500SecondsBeforeItsEnd)
@@ -159,11 +144,11 @@ TEST_F(GoogleAuth, KeepsATokenUntil500SecondsBeforeItsEnd)
     const auto requestsFor = [this](const char* lifetime, qint64 later) {
         answer = QByteArray(R"({"access_token":"t","token_type":"Bearer","expires_in":)") + lifetime + '}';
         auth.loadCredentialsFromJson(key(), "test");
-        const size_t before = server.requests().size();
+        const size_t before = asked.size();
         header();
         now += later;
         header();
-        return server.requests().size() - before;
+        return asked.size() - before;
     };
     const std::pair<const char*, qint64> kKept[] = {
         {"3600", 3100}, {"501", 1}, {"500", 0}, {"1e300", 999'999'500}};  // [s]
@@ -178,12 +163,8 @@ TEST_F(GoogleAuth, KeepsATokenUntil500SecondsBeforeItsEnd)
 TEST_F(GoogleAuth, FetchesOneTokenForAllThreads)
 {
     auth.loadCredentialsFromJson(key(), "test");
-    std::vector<std::thread> threads;
-    for (int i = 0; i < 16; ++i)
-        threads.emplace_back([this] { EXPECT_EQ(header(), "Authorization: Bearer t.1"); });
-    for (std::thread& thread : threads)
-        thread.join();
-    EXPECT_EQ(server.requests().size(), 1U);
+    onThreads(16, [this](int) { EXPECT_EQ(header(), "Authorization: Bearer t.1"); });
+    EXPECT_EQ(asked.size(), 1U);
 }
 
 TEST_F(GoogleAuth, NamesWhatIsWrongWithAKeyAndKeepsTheFormerOne)
@@ -231,21 +212,18 @@ TEST_F(GoogleAuth, ReadsTheKeyFromTheFileThatTheEnvironmentNames)
         {name, "{}", "Empty Json object in " + name},
         {name, "{\"a\":1}", "Credential type is '' in " + name + ", expected 'service_account'"},
         {name, good, ""}};
-    qputenv("KDD_CLOUD_TOKEN", server.url("default").c_str());
+    const Setting place("KDD_CLOUD_TOKEN", "http://default/");
+    Setting variable("GOOGLE_APPLICATION_CREDENTIALS", "");
     for (const auto& one : kCases) {
         const LogCapture log;
-        file.resize(0);
-        file.seek(0);
-        file.write(one.content);
-        file.flush();
-        qputenv("GOOGLE_APPLICATION_CREDENTIALS", one.variable.c_str());
+        writeFile(file.fileName(), one.content);
+        variable.set(one.variable);
         EXPECT_EQ(header().isEmpty(), !one.message.empty()) << one.message;
         EXPECT_EQ(log.count(one.message), int(log.lines().size())) << testing::PrintToString(log.lines());
     }
-    qunsetenv("KDD_CLOUD_TOKEN");
-    ASSERT_EQ(server.requests().size(), 1U);
-    EXPECT_TRUE(decoded(token().split('.')[1]).contains("\"aud\":\"http://127.0.0.1:"));
-    EXPECT_TRUE(server.requests().back().startsWith("POST /default "));
+    ASSERT_EQ(asked.size(), 1U);
+    EXPECT_EQ(asked.back().first, "http://default/");
+    EXPECT_TRUE(decoded(token(1)).contains("\"aud\":\"http://default/\""));
 }
 
 TEST_F(GoogleAuth, SendsNothingThatItCannotSign)
@@ -261,62 +239,48 @@ TEST_F(GoogleAuth, SendsNothingThatItCannotSign)
         EXPECT_EQ(header(), QByteArray());
         EXPECT_THAT(log.lines(), testing::ElementsAre(kParsing));
     }
-    EXPECT_TRUE(server.requests().empty());
+    EXPECT_TRUE(asked.empty());
 }
 
 TEST_F(GoogleAuth, RefusesAnswersWithoutAUsableToken)
 {
+    const KxHttpStatus kUnreached = {0, {}, true, 0, 0, "Failed to connect"};
     struct
     {
-        QByteArray code;
+        KxHttpStatus status;
         QByteArray answer;
         std::string message;
-    } const kCases[] = {{"401 Unauthorized", R"({ "error" : "invalid_grant" })",
-                         R"(response code 401. {"error":"invalid_grant"})"},
-                        {"500 Oops", "sorry", "response code 500. "},
-                        {"200 OK", R"({"access_token":"secret"})",
-                         R"(Invalid authorization response. {"access_token":"..."})"},
-                        {"200 OK", R"({"token_type":"Bearer"})",
-                         R"(Invalid authorization response. {"token_type":"Bearer"})"},
-                        {"200 OK", R"({"access_token":"a\r\nX: 1","token_type":"Bearer"})",
-                         "Invalid authorization response."},
-                        {"200 OK", "[]", "Invalid authorization response. []"}};
+    } const kCases[] = {
+        {{401, {}}, R"({ "error" : "invalid_grant" })", R"(response code 401. {"error":"invalid_grant"})"},
+        {{500, {}}, "sorry", "response code 500. "},
+        {kUnreached, "", "from http://tokens/a, response code 0. Failed to connect"},
+        {{200, {}}, R"({"access_token":"secret"})", R"(authorization response. {"access_token":"..."})"},
+        {{200, {}}, R"({"token_type":"Bearer"})", R"(authorization response. {"token_type":"Bearer"})"},
+        {{200, {}}, R"({"access_token":"a\r\nX: 1","token_type":"Bearer"})", "Invalid authorization"},
+        {{200, {}}, "[]", "Invalid authorization response. []"}};
     auth.loadCredentialsFromJson(key(), "test");
     for (const auto& one : kCases) {
         const LogCapture log;
-        code = one.code;
+        status = one.status;
         answer = one.answer;
         EXPECT_EQ(header(), QByteArray());
         EXPECT_EQ(log.count(one.message), 1) << testing::PrintToString(log.lines());
     }
 }
 
-TEST_F(GoogleAuth, IsToldNoSession)
+QByteArray tokenAnswer(const QByteArray& token, int lifetime)
 {
-    KxCurlClient::instance().setSessionID("12");
-    ASSERT_TRUE(auth.loadCredentialsFromJson(key(), "test"));
-    EXPECT_FALSE(header().isEmpty());
-    KxCurlClient::instance().setSessionID({});
-    EXPECT_TRUE(server.requests().back().startsWith("POST /token HTTP/1.1\r\n"));
-}
-
-TEST_F(GoogleAuth, TellsWhyThePlaceOfTokensCannotBeReached)
-{
-    const LogCapture log;
-    ASSERT_TRUE(auth.loadCredentialsFromJson(account().key("http://127.0.0.1:1/t"), "test"));
-    EXPECT_EQ(header(), QByteArray());
-    EXPECT_EQ(log.count("from http://127.0.0.1:1/t, response code 0. Failed to connect"), 1);
+    return httpResponse("{\"access_token\":\"" + token +
+                        "\",\"token_type\":\"Bearer\",\"expires_in\":" + QByteArray::number(lifetime) + '}');
 }
 
 TEST(CloudClient, AuthorizesWhatItUploadsAndDeletes)
 {
     const LogCapture log;
     const CloudStore store;
-    const ScriptedServer tokens([](const QByteArray&) -> ScriptedServer::Reply {
-        return {
-            "HTTP/1.1 200 OK\r\n\r\n{\"access_token\":\"t\",\"token_type\":\"Bearer\",\"expires_in\":3600}"};
-    });
+    const ScriptedServer tokens(tokenAnswer("t", 3600));
     KxCurlClient& client = KxCurlClient::instance();
+    client.setSessionID("12");
     client.setGoogleAuthentication(account().key(tokens.url("")));
     KxCurlUploadStream stream = client.write("gs://b/x/y");
     stream << "bytes";
@@ -327,50 +291,39 @@ TEST(CloudClient, AuthorizesWhatItUploadsAndDeletes)
     EXPECT_TRUE(store.requests().back().startsWith("DELETE /b/x%2Fy HTTP/1.1\r\n"));
     for (const QByteArray& request : store.requests())
         EXPECT_TRUE(request.contains("\r\nAuthorization: Bearer t\r\n")) << request.toStdString();
-    EXPECT_EQ(tokens.requests().size(), 1U);
-    for (const char* address : {"https://a/b", "gs://b", "gs://b/", "gs:"})
-        EXPECT_THROW(client.write(address), std::invalid_argument) << address;
+    client.setSessionID({});
+    ASSERT_EQ(tokens.requests().size(), 1U);
+    EXPECT_TRUE(tokens.requests().back().startsWith("POST / HTTP/1.1\r\n")) << "without the session";
+    EXPECT_TRUE(tokens.requests().back().contains("\r\nContent-Type: application/x-www-form-urlencoded\r\n"));
 }
 
-/// A client that is given another token for each request.
-class ShortTokens : public testing::Test
+/// How many different tokens the requests carried.
+int tokensOf(const std::vector<QByteArray>& requests)
 {
-protected:
-    ShortTokens() { client.setGoogleAuthentication(account().key(tokens.url(""))); }
+    QSet<QByteArray> lines;
+    for (const QByteArray& request : requests)
+        lines.insert(headerOf(request, "Authorization"));
+    EXPECT_FALSE(lines.contains(""));
+    return lines.size();
+}
 
-    /// How many different tokens the requests carried.
-    static int tokensOf(const std::vector<QByteArray>& requests)
-    {
-        QSet<QByteArray> lines;
-        for (const QByteArray& request : requests)
-            lines.insert(request.mid(request.indexOf("\r\nAuthorization: ") + 2, 26));
-        EXPECT_FALSE(lines.contains(""));
-        return lines.size();
-    }
-
+TEST(CloudClient, AuthorizesEachRangeAndChunkByTheTokenOfItsTime)
+{
     std::atomic<int> count{0};
-    const ScriptedServer tokens{[this](const QByteArray&) -> ScriptedServer::Reply {
-        return {"HTTP/1.1 200 OK\r\n\r\n{\"access_token\":\"t" + QByteArray::number(++count) +
-                "\",\"token_type\":\"Bearer\",\"expires_in\":0}"};
-    }};
+    const ScriptedServer tokens([&](const QByteArray&) -> ScriptedServer::Reply {
+        return {tokenAnswer('t' + QByteArray::number(++count), 0)};
+    });
     KxCurlClient& client = KxCurlClient::instance();
-};
-
-TEST_F(ShortTokens, AuthorizeEachRangeByThatOfItsTime)
-{
-    const ObjectServer store(someObject(8000));
-    qputenv("KDD_CLOUD_DOWNLOAD", store.origin().c_str());
+    client.setGoogleAuthentication(account().key(tokens.url("")));
+    const ObjectServer object(someObject(8000));
+    const Setting host("KDD_CLOUD_DOWNLOAD", object.origin());
     client.setNumConcurrentRequestsPerFile(2);
     client.setChunkSizeForPartialRequests(2000);
     KxHttpStatus status;
     EXPECT_EQ(client.readBytes("gs://b/x", status), someObject(8000));
-    qunsetenv("KDD_CLOUD_DOWNLOAD");
     client.setNumConcurrentRequestsPerFile(1);
-    EXPECT_EQ(tokensOf(store.requests()), 4);
-}
+    EXPECT_EQ(tokensOf(object.requests()), 4);
 
-TEST_F(ShortTokens, AuthorizeEachChunkByThatOfItsTime)
-{
     const CloudStore store;
     KxCurlUploadStream stream = client.write("gs://b/long");
     for (int i = 0; i < 3; ++i)

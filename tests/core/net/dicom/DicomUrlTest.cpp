@@ -4,6 +4,7 @@
 #include "kddlib/net/dicom/DcmInputHttpStream.h"
 #include "kddlib/net/dicom/KxDcmFileLoader.h"
 #include "support/DatasetBuilder.h"
+#include "support/Files.h"
 #include "support/HttpServer.h"
 #include "support/LogCapture.h"
 #include "support/RealFiles.h"
@@ -26,12 +27,6 @@ using Mode = KxDcmFileLoader::Mode;
 
 namespace
 {
-
-QByteArray contentOf(const QString& path)
-{
-    QFile file(path);
-    return file.open(QIODevice::ReadOnly) ? file.readAll() : QByteArray();
-}
 
 /// All attributes with all their values; or just why not all could be read.
 std::string textOf(KxDcmFileLoader& loader, const OFCondition& condition)
@@ -57,7 +52,7 @@ protected:
     {
         DcmFileFormat format(&image.dataset());
         format.saveFile(path().c_str(), EXS_LittleEndianExplicit);
-        bytes = contentOf(folder.filePath(QStringLiteral("a.dcm")));
+        bytes = contentOf(QString::fromStdString(path()));
     }
     ~DicomUrl() override
     {
@@ -67,12 +62,6 @@ protected:
     }
 
     std::string path() const { return folder.filePath(QStringLiteral("a.dcm")).toStdString(); }
-
-    static QByteArray withLength(const QByteArray& body, int missing = 0)
-    {
-        return "HTTP/1.1 200 OK\r\nContent-Length: " + QByteArray::number(body.size()) + "\r\n\r\n" +
-               body.chopped(missing);
-    }
 
     /// The port of a server, as the storage servers have it.
     static std::string portOf(const ScriptedServer& server)
@@ -89,8 +78,7 @@ protected:
 
 TEST_F(DicomUrl, ReadsTheSameFromAPathAUrlAndAStorageServer)
 {
-    const ScriptedServer server(
-        [this](const QByteArray&) -> ScriptedServer::Reply { return {withLength(bytes)}; });
+    const ScriptedServer server(httpResponse(bytes));
     KxDcmFileLoader::setDefaultPort(portOf(server).c_str());
     KxDcmFileLoader::setBearerToken("secret");
     const std::string expected = load(path(), Mode::WholeLocal);
@@ -110,50 +98,40 @@ TEST_F(DicomUrl, ReadsTheSameFromAPathAUrlAndAStorageServer)
 
 TEST_F(DicomUrl, NeedsNoLengthFromTheServer)
 {
-    const ScriptedServer server(
-        [this](const QByteArray&) -> ScriptedServer::Reply { return {"HTTP/1.1 200 OK\r\n\r\n" + bytes}; });
+    const ScriptedServer server("HTTP/1.1 200 OK\r\n\r\n" + bytes);
     EXPECT_EQ(load(server.url("a.dcm"), Mode::Default), load(path(), Mode::Default));
 }
 
 TEST_F(DicomUrl, FailsWhereverTheTransferBreaksOff)
 {
-    const std::string whole = load(path(), Mode::Default);
-    int missing = 0;
+    int present = 0;
     const ScriptedServer server(
-        [&](const QByteArray&) -> ScriptedServer::Reply { return {withLength(bytes, missing)}; });
-    for (const int present : {0, 1, 131, 200, 340, 1000, 100'000, bytes.size() - 1}) {
-        missing = bytes.size() - present;
-        EXPECT_THAT(load(server.url("a.dcm"), Mode::Default), Not(HasSubstr("Normal\n"))) << present;
+        [&](const QByteArray&) -> ScriptedServer::Reply { return {httpResponse(bytes).left(present)}; });
+    const int head = httpResponse(bytes).size() - bytes.size();
+    for (const int count : {0, 1, 131, 200, 340, 1000, 100'000, bytes.size() - 1}) {
+        present = head + count;
+        EXPECT_THAT(load(server.url("a.dcm"), Mode::Default), Not(HasSubstr("Normal\n"))) << count;
     }
-    missing = 0;
-    EXPECT_EQ(load(server.url("a.dcm"), Mode::Default), whole);
 }
 
-TEST_F(DicomUrl, TellsOfARefusalOnce)
+TEST_F(DicomUrl, TellsOnceWhyItFailed)
 {
+    const ScriptedServer cut(httpResponse(bytes).chopped(1000));
+    const ScriptedServer forbidden(httpResponse("no", "403 Forbidden"));
+    const std::pair<std::string, std::string> kCases[] = {{"http://127.0.0.1:1/a", "Failed to connect"},
+                                                          {forbidden.url("a"), "HTTP response code 403"},
+                                                          {cut.url("a"), "transfer closed with 1000 bytes"}};
+    for (const auto& [url, reason] : kCases) {
+        const LogCapture log;
+        EXPECT_TRUE(KxDcmFileLoader().loadFile(url.c_str()).bad());
+        EXPECT_EQ(log.count("Reading " + url + " failed: " + reason), 1);
+    }
     const LogCapture log;
-    const ScriptedServer server([](const QByteArray&) -> ScriptedServer::Reply {
-        return {"HTTP/1.1 403 Forbidden\r\nContent-Length: 2\r\n\r\nno"};
-    });
-    KxDcmFileLoader loader;
-    EXPECT_EQ(loader.loadFile(server.url("a").c_str()), EC_InvalidStream);
-    EXPECT_EQ(log.count("Reading " + server.url("a") + " failed: HTTP response code 403"), 1);
+    KxDcmFileLoader::setDefaultPort("1");
     EXPECT_EQ(KxDcmFileLoader(Mode::StorageServer).loadFile("//127.0.0.1/a/b"), EC_InvalidStream);
-    DcmInputHttpStream unasked;
-    EXPECT_STREQ(unasked.status().text(), "Logical error on IO operation");
-}
-
-TEST_F(DicomUrl, TellsWhyATransferFailed)
-{
-    const LogCapture log;
-    EXPECT_EQ(KxDcmFileLoader().loadFile("http://127.0.0.1:1/a"), EC_InvalidStream);
-    EXPECT_EQ(log.count("Reading http://127.0.0.1:1/a failed: Failed to connect"), 1);
     EXPECT_EQ(Loader::loadDcmDataset("http://127.0.0.1:1/a", 100), nullptr);
     EXPECT_EQ(log.count("Could not open http://127.0.0.1:1/a: Failed to connect"), 1);
-    const ScriptedServer server(
-        [&](const QByteArray&) -> ScriptedServer::Reply { return {withLength(bytes, 1000)}; });
-    EXPECT_TRUE(KxDcmFileLoader().loadFile(server.url("a").c_str()).bad());
-    EXPECT_EQ(log.count("Reading " + server.url("a") + " failed: transfer closed with 1000 bytes"), 1);
+    EXPECT_STREQ(DcmInputHttpStream().status().text(), "Logical error on IO operation");
 }
 
 TEST_F(DicomUrl, AValueThatWasLeftInAFileDoesNotComeFromAnother)
@@ -247,10 +225,8 @@ TEST(RealFilesByUrl, AreReadAsFromTheirPaths)
     if (realFilesFolder().isEmpty())
         GTEST_SKIP() << "KDD_TEST_DATA is not set";
     QByteArray content;
-    const ScriptedServer server([&](const QByteArray&) -> ScriptedServer::Reply {
-        return {"HTTP/1.1 200 OK\r\nContent-Length: " + QByteArray::number(content.size()) + "\r\n\r\n" +
-                content};
-    });
+    const ScriptedServer server(
+        [&](const QByteArray&) -> ScriptedServer::Reply { return {httpResponse(content)}; });
     for (const char* subfolder : {"transfer-syntaxes", "modalities", "odd"}) {
         for (const QString& path : realFiles(subfolder)) {
             content = contentOf(path);

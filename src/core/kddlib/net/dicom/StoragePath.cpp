@@ -1,4 +1,4 @@
-#include "kddlib/net/cloud/StoragePath.h"
+#include "kddlib/net/dicom/StoragePath.h"
 
 #include "kddlib/net/http/RequestAddress.h"
 
@@ -40,6 +40,7 @@ StoragePath parse(std::string name)
         if (end == std::string::npos)
             break;
         const std::string host = name.substr(prefix.size(), end - prefix.size());
+        // No other prefix can fit: a name that begins so is of this form or of none.
         if (!isHost(host))
             break;
         return {host, escapedName(std::string_view(name).substr(end))};

@@ -1,4 +1,4 @@
-#include "kddlib/net/http/RetryPolicy.h"
+#include "kddlib/net/cloud/RetryPolicy.h"
 
 #include <algorithm>
 #include <cmath>
@@ -14,6 +14,7 @@ constexpr qint64 kMaxJitter = 1000;  // [ms]
 
 std::chrono::milliseconds RetryPolicy::nextDelay()
 {
+    // Counted once only, so that asking again after the end does not wrap.
     if (!exhausted())
         ++mAttempts;
     if (exhausted())
