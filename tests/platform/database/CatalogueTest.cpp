@@ -145,6 +145,19 @@ TEST_P(CatalogueTest, ImagesAreListedWhereACorrectionPutThemAndFilesFollow)
     EXPECT_EQ(told("3"), "none");
 }
 
+TEST_P(CatalogueTest, AMoveTakenBackLeavesTheFileThatItHadHidden)
+{
+    add({dicom("/d/moved", "1", "1.1", "x"), dicom("/d/native", "2", "2.1", "x")});
+    Requests requests;
+    ASSERT_TRUE(catalogue().recordCorrections({{"1", "x", "2", "2.1", "x", "changes"}}, requests).good());
+    EXPECT_EQ(told("1") + told("2"), "none2.1 :\n2.1 x /d/moved\n");
+    add({dicom("/d/later", "1", "1.1", "x")});
+    ASSERT_TRUE(catalogue().recordCorrections({{"1", "x", "1", "1.1", "x", ""}}, requests).good());
+    EXPECT_EQ(told("1") + told("2"), "1.1 :\n1.1 x /d/later\n2.1 :\n2.1 x /d/native\n");
+    ASSERT_TRUE(catalogue().recordCorrections({{"2", "x", "3", "3.1", "x", "more"}}, requests).good());
+    EXPECT_EQ(told("1") + told("2") + told("3"), "1.1 :\n1.1 x /d/later\nnone3.1 :\n3.1 x /d/native\n");
+}
+
 TEST_P(CatalogueTest, AnImageWithoutUidIsCorrectedAndRemovedByItsPath)
 {
     add({dicom("/d/a", "1", "1.1", ""), dicom("/d/b", "1", "1.1", "")});
