@@ -139,7 +139,7 @@ void recordCorrection(SqlConnection& connection, const ImageCorrection& correcti
     const Place before = placeBefore(connection, correction);
     const QVariant correctionId = keep(connection, correction);
     const qint64 oldStudy = findStudyId(connection, before.studyUID);
-    const qint64 newStudy = obtainStudy(connection, correction.shownStudyUID);
+    const qint64 newStudy = obtainStudy(connection, correction.shownStudyUID).id;
     touched.insert(newStudy);
     if (oldStudy == 0)
         return;
@@ -153,7 +153,8 @@ void recordCorrection(SqlConnection& connection, const ImageCorrection& correcti
     const qint64 newSeries =
         obtainSeries(connection, newStudy,
                      correction.shownSeriesUID.isEmpty() ? seriesUIDOf(connection, files.back().seriesId)
-                                                         : correction.shownSeriesUID);
+                                                         : correction.shownSeriesUID)
+            .id;
     // What has no UID is known by its path, which no correction changes, until one gives it a UID.
     const QByteArray sopUID =
         correction.shownImage == files.back().path ? QByteArray("") : correction.shownImage;

@@ -2,7 +2,6 @@
 
 #include "platform/database/CorrectionRows.h"
 #include "platform/database/SqlConnection.h"
-#include "platform/database/StudyContent.h"
 #include "platform/database/StudyDescription.h"
 
 #include <algorithm>
@@ -227,8 +226,8 @@ void FileRegistration::tellConflict(const Entry& entry, const Entry& other)
 
 void FileRegistration::place(Entry& entry)
 {
-    Known& study = knownStudy(entry.studyUID);
-    Known& series = knownSeries(study.id, entry.seriesUID);
+    KeptNode& study = knownStudy(entry.studyUID);
+    KeptNode& series = knownSeries(study.id, entry.seriesUID);
     mTouched.insert(study.id);
     if (entry.attributes && !study.isDescribed) {
         describeStudy(mConnection, study.id, *entry.attributes);
@@ -242,38 +241,19 @@ void FileRegistration::place(Entry& entry)
     entry.seriesId = series.id;
 }
 
-FileRegistration::Known& FileRegistration::knownStudy(const QByteArray& uid)
+KeptNode& FileRegistration::knownStudy(const QByteArray& uid)
 {
-    Known& study = mStudies[uid];
-    if (study.id != 0)
-        return study;
-    const QVariant text = textValue(uid);
-    SqlRows found = mConnection.ask("SELECT id, is_described FROM study WHERE uid = ?", {text});
-    if (found.next()) {
-        study = {found.number(0), found.number(1) != 0};
-    } else {
-        SqlRows made = mConnection.ask("INSERT INTO study (uid) VALUES (?) RETURNING id", {text});
-        if (made.next())
-            study.id = made.number(0);
-    }
+    KeptNode& study = mStudies[uid];
+    if (study.id == 0)
+        study = obtainStudy(mConnection, uid);
     return study;
 }
 
-FileRegistration::Known& FileRegistration::knownSeries(qint64 studyId, const QByteArray& uid)
+KeptNode& FileRegistration::knownSeries(qint64 studyId, const QByteArray& uid)
 {
-    Known& series = mSeries[{studyId, uid}];
-    if (series.id != 0)
-        return series;
-    const QVariantList key = {studyId, textValue(uid)};
-    SqlRows found =
-        mConnection.ask("SELECT id, is_described FROM series WHERE study_id = ? AND uid = ?", key);
-    if (found.next()) {
-        series = {found.number(0), found.number(1) != 0};
-    } else {
-        SqlRows made = mConnection.ask("INSERT INTO series (study_id, uid) VALUES (?, ?) RETURNING id", key);
-        if (made.next())
-            series.id = made.number(0);
-    }
+    KeptNode& series = mSeries[{studyId, uid}];
+    if (series.id == 0)
+        series = obtainSeries(mConnection, studyId, uid);
     return series;
 }
 
