@@ -81,20 +81,13 @@ TEST_P(MigrationTest, ADatabaseOfTheFirstReleaseKeepsAllThatItKnows)
 TEST_P(MigrationTest, ADatabaseOfTheSecondSchemaKnowsWhichFilesACorrectionMoved)
 {
     add({dicom("/d/a", "1", "1.1", "x"), dicom("/d/b", "1", "1.1", "")});
-    Requests requests;
-    ASSERT_TRUE(catalogue()
-                    .recordCorrections({{"1", "x", "2", "2.1", "y", "changes"},
-                                        {"1", "/d/b", "2", "2.1", "/d/b", "changes"}},
-                                       requests)
-                    .good());
+    correct({{"1", "x", "2", "2.1", "y", "changes"}, {"1", "/d/b", "2", "2.1", "/d/b", "changes"}});
     for (const char* backwards :
          {"DROP INDEX file_of_correction", "ALTER TABLE file DROP COLUMN correction_id",
           "UPDATE schema_version SET version = 2"})
         execute(backwards);
-    ASSERT_TRUE(open()
-                    ->recordCorrections(
-                        {{"1", "x", "1", "1.1", "x", ""}, {"1", "/d/b", "1", "1.1", "/d/b", ""}}, requests)
-                    .good());
+    open();  // and bring it up to date
+    correct({{"1", "x", "1", "1.1", "x", ""}, {"1", "/d/b", "1", "1.1", "/d/b", ""}});
     EXPECT_EQ(studies(), "1   1/2/0*\n");
 }
 
