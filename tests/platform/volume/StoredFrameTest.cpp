@@ -68,14 +68,6 @@ TEST(StoredFrame, FramesOfSingleBitsNeedNotBeginAtAByte)
     EXPECT_EQ(storedNumbers(image, 2), (QVector<double>{1, 1, 1, 0, 0}));
 }
 
-TEST(StoredFrame, FramesOfAnOddNumberOfBytesAreFound)
-{
-    const auto image =
-        PixelDataset(1, 3, 8).with(DCM_NumberOfFrames, "3").bytes({1, 2, 3, 4, 5, 6, 7, 8, 9, 0});
-    EXPECT_EQ(storedNumbers(image, 1), (QVector<double>{4, 5, 6}));
-    EXPECT_EQ(storedNumbers(image, 2), (QVector<double>{7, 8, 9}));
-}
-
 struct Refusal
 {
     const char* name;
