@@ -204,24 +204,8 @@ void TagFileGenerator::addFile(TagFile& tagFile, const std::string& path, const 
                                StudySources& sources)
 {
     const QByteArray name = QByteArray::fromStdString(path);
-    std::unique_ptr<TagMap> image;
     const bool isUndecided = sources.adopted->undecided().contains(name);
-    if (!isUndecided) {
-        image = sources.loaded.copy(path);
-        if (image == nullptr)
-            image = load(path, sources);
-        if (image != nullptr && !sources.corrections.applyTo(*image, name))
-            image.reset();
-        const bool isForeign = image != nullptr && studyInstanceUID != nullptr &&
-                               image->uid(TagMap::StudyLevel) != studyInstanceUID;
-        if (image != nullptr && (isForeign || !sources.isListed(*image, name))) {
-            if (isForeign)
-                LogFile::warnf(kForeign, path.c_str(), studyInstanceUID);
-            else
-                LogFile::errorf("%s is not the image that was registered any more", path.c_str());
-            image.reset();
-        }
-    }
+    std::unique_ptr<TagMap> image = isUndecided ? nullptr : readListed(path, studyInstanceUID, sources);
     if (image == nullptr) {
         image = isUndecided ? sources.formerImages.copy(path) : sources.copyFormer(path);
         if (!isUndecided)
@@ -233,6 +217,28 @@ void TagFileGenerator::addFile(TagFile& tagFile, const std::string& path, const 
             sources.corrections.applyToFormer(*image);
     }
     addImage(tagFile, std::move(image), path, studyInstanceUID);
+}
+
+/// The image that the database lists for the file, as corrections make it; null, with the reason logged, when the file
+/// has no such image.
+std::unique_ptr<TagMap> TagFileGenerator::readListed(const std::string& path, const char* studyInstanceUID,
+                                                     StudySources& sources)
+{
+    const QByteArray name = QByteArray::fromStdString(path);
+    std::unique_ptr<TagMap> image = sources.loaded.copy(path);
+    if (image == nullptr)
+        image = load(path, sources);
+    if (image == nullptr || !sources.corrections.applyTo(*image, name))
+        return nullptr;
+    if (studyInstanceUID != nullptr && image->uid(TagMap::StudyLevel) != studyInstanceUID) {
+        LogFile::warnf(kForeign, path.c_str(), studyInstanceUID);
+        return nullptr;
+    }
+    if (!sources.isListed(*image, name)) {
+        LogFile::errorf("%s is not the image that was registered any more", path.c_str());
+        return nullptr;
+    }
+    return image;
 }
 
 /// The image as the file has it; null, with the reason logged, when it cannot be read.

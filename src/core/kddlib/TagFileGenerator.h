@@ -90,6 +90,8 @@ protected:
 private:
     void addFile(TagFile& tagFile, const std::string& path, const char* studyInstanceUID,
                  StudySources& sources);
+    std::unique_ptr<TagMap> readListed(const std::string& path, const char* studyInstanceUID,
+                                       StudySources& sources);
     std::unique_ptr<TagMap> load(const std::string& path, StudySources& sources);
     void addVolumes(TagFile& tagFile, const std::vector<std::string>& volumeFiles, StudySources& sources);
     static bool write(TagFile& tagFile, StudySources& sources);

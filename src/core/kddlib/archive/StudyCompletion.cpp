@@ -70,6 +70,7 @@ CompletedStudy StudyCompletion::reduce(Kxg::StudyClaim& claim)
     }
     const std::vector<QByteArray> gone = unlisted(present);
     std::vector<const char*> keys;
+    keys.reserve(gone.size());
     for (const QByteArray& key : gone)
         keys.push_back(key.constData());
     present.removeImages(static_cast<int>(keys.size()), keys.data());

@@ -98,13 +98,14 @@ QVector<StackFrames> partedByReference(const QVector<StackFrames>& groups, QVect
             partedBy(group, [](const StackFrame& frame) { return frame.frameOfReference; });
         const bool areCut = parts.size() > 1 && group.size() >= kLeastSlices;
         for (const StackFrames& part : parts) {
-            if (areCut && part.size() < kLeastSlices)
+            if (areCut && part.size() < kLeastSlices) {
                 leaveOut(
                     part,
                     QStringLiteral("Its Frame of Reference is not that of the other slices of its geometry"),
                     leftOut);
-            else
+            } else {
                 result.append(part);
+            }
         }
     }
     // As the frames lie in the series.
