@@ -74,7 +74,7 @@ Workload::Workload(int images)
     const SampleSummary summary = writeSampleStudies(mFolder.path(), {40, 1}, [](int, int) {});
     DcmFileFormat pattern;
     const QString first = mFolder.filePath(QStringLiteral("CT-1/2/IM0001.dcm"));
-    if (!summary.failure.isEmpty() || pattern.loadFile(first.toLocal8Bit().constData()).bad())
+    if (summary.result.bad() || pattern.loadFile(first.toLocal8Bit().constData()).bad())
         throw std::runtime_error("the sample studies cannot be made");
     pattern.loadAllDataIntoMemory();
     for (int i = 1; i <= images; ++i) {

@@ -123,7 +123,7 @@ SampleSummary writeSampleStudies(const QString& folder, const SampleOptions& opt
                                  const std::function<void(int done, int total)>& progress)
 {
     SampleFolder files(folder, progress);
-    QString failure;
+    Result result;
     try {
         checkOptions(options);
         const Plan plan = planStudies(options);
@@ -131,10 +131,10 @@ SampleSummary writeSampleStudies(const QString& folder, const SampleOptions& opt
         for (const PlannedStudy& planned : plan.studies)
             planned.kind->write(planned.study, files);
     } catch (const SampleFault& fault) {
-        failure = fault.sentence();
+        result = Result::failure(fault.sentence());
     }
     SampleSummary summary = files.summary();
-    summary.failure = failure;
+    summary.result = result;
     return summary;
 }
 

@@ -1,5 +1,7 @@
 #pragma once
 
+#include "platform/base/Result.h"
+
 #include <QString>
 
 #include <functional>
@@ -20,7 +22,7 @@ struct SampleSummary
     int series = 0;
     int images = 0;    // files, presentation states and reports among them
     qint64 bytes = 0;  // of all files together
-    QString failure;   // empty, or what could not be written and why
+    Result result;     // a failure says what could not be written and why
 };
 
 /// Writes a day's work of a small hospital below `folder`, which is made when it is not there: CT, MR,

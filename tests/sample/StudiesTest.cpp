@@ -30,7 +30,7 @@ QMap<QString, QByteArray> filesBelow(const QTemporaryDir& folder)
 
 QMap<QString, QByteArray> written(const QTemporaryDir& folder, int images)
 {
-    EXPECT_EQ(writeSampleStudies(folder.path(), {images, 1}, {}).failure, QString());
+    EXPECT_EQ(writeSampleStudies(folder.path(), {images, 1}, {}).result.text(), QString());
     return filesBelow(folder);
 }
 
@@ -113,7 +113,7 @@ TEST(SampleStudies, ThatCannotBeWrittenSayWhichFolderAndWhy)
     for (const QString& place : {file.fileName(), QStringLiteral("/proc/samples")}) {
         const SampleSummary summary = writeSampleStudies(place, {30, 1}, {});
         const QString start = QLatin1String("Cannot make the folder ") + place + QLatin1String("/CT-1/1: ");
-        EXPECT_TRUE(summary.failure.startsWith(start)) << qPrintable(summary.failure);
+        EXPECT_TRUE(summary.result.text().startsWith(start)) << qPrintable(summary.result.text());
         EXPECT_EQ(summary.images, 0);
     }
     EXPECT_EQ(filesBelow(folder).size(), 1);

@@ -6,7 +6,6 @@
 #include "platform/database/DirectoryEntry.h"
 #include "platform/database/Kxg.h"
 #include "platform/os/FileStatus.h"
-#include "platform/os/PathName.h"
 
 #include <algorithm>
 
@@ -115,9 +114,8 @@ bool StudySources::readFormer()
     for (int i = 0; i < kReadingAttempts && !isRead && (i == 0 || former.wasLockedOut()); ++i)
         isRead = former.readCacheFileForStudy(studyUID.constData(), false);
     // An empty one counts as just being made; whoever made it is dead, for a build has the study to itself.
-    FileStatus status;
-    const QString path = TagFile::cacheFilePathForStudy(studyUID.constData());
-    const bool isEmpty = statusOf(pathBytes(path).constData(), status) && status.size == 0;
+    const bool isEmpty =
+        presenceOf(TagFile::cacheFilePathForStudy(studyUID.constData())) == FilePresence::Empty;
     if (!isRead && former.wasLockedOut() && !isEmpty) {
         LogFile::errorf("The tag file of study %s cannot be read: others hold it", studyUID.constData());
         return false;

@@ -9,6 +9,7 @@
 #include "kddlib/previews/QuadrantNavigation.h"
 #include "kddlib/tagfile/CorrectedVolumes.h"
 #include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagfile/TagFileRemoval.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
@@ -18,9 +19,9 @@
 #include "platform/os/PathName.h"
 #include "platform/volumefile/OrlanMesh.h"
 
-#include <QFile>
 #include <QMap>
 #include <QSet>
+#include <QThread>
 
 #include <dcmtk/dcmdata/dcfilefo.h>
 
@@ -37,6 +38,10 @@ const char* const kDefaultUser = "zp_administrator";
 const char* const kSeriesInstanceUID = "G0020-000E";
 const char* const kModality = "G0008-0060";
 const char* const kMammography = "MG";
+
+/// Of two minutes in all, for a removal does not wait itself.
+constexpr int kRemovalAttempts = 6000;
+constexpr unsigned long kRemovalPause = 20;  // [ms]
 
 constexpr char kForeign[] = "File %s does not belong to study %s";
 
@@ -141,13 +146,10 @@ bool TagFileGenerator::write(TagFile& tagFile, StudySources& sources)
 {
     if (tagFile.isEmpty() && sources.dicomFiles.empty()) {
         // Its images were moved away, and a volume file alone shows nothing.
-        TagFile abandoned;
-        const QByteArray& studyUID = sources.corrections.studyUID();
-        if (!QFile::exists(TagFile::cacheFilePathForStudy(studyUID.constData())))
-            return true;
-        const bool isHeld = abandoned.readCacheFileForStudy(studyUID.constData(), true);
-        abandoned.clear();
-        return isHeld && abandoned.writeCacheFile();
+        const Result removed = removeTagFile(sources.corrections.studyUID());
+        if (removed.bad())
+            LogFile::errorf("%s", qUtf8Printable(removed.text()));
+        return removed.good();
     }
     if (!tagFile.writeCacheFile())
         return false;
@@ -155,6 +157,18 @@ bool TagFileGenerator::write(TagFile& tagFile, StudySources& sources)
     if (result.bad())
         LogFile::warnf("%s", qUtf8Printable(result.text()));
     return true;
+}
+
+Result TagFileGenerator::removeTagFile(const QByteArray& studyInstanceUID)
+{
+    const QString path = TagFile::cacheFilePathForStudy(studyInstanceUID.constData());
+    for (int i = 0; i < kRemovalAttempts; ++i) {
+        if (removeTagFileOnce(path) == 0)
+            return {};
+        QThread::msleep(kRemovalPause);
+    }
+    return Result::failure(QStringLiteral("The tag file of study %1 cannot be removed: others hold it")
+                               .arg(QString::fromUtf8(studyInstanceUID)));
 }
 
 void TagFileGenerator::completeArrivals(TagFile& arrivals)
@@ -190,24 +204,8 @@ void TagFileGenerator::addFile(TagFile& tagFile, const std::string& path, const 
                                StudySources& sources)
 {
     const QByteArray name = QByteArray::fromStdString(path);
-    std::unique_ptr<TagMap> image;
     const bool isUndecided = sources.adopted->undecided().contains(name);
-    if (!isUndecided) {
-        image = sources.loaded.copy(path);
-        if (image == nullptr)
-            image = load(path, sources);
-        if (image != nullptr && !sources.corrections.applyTo(*image, name))
-            image.reset();
-        const bool isForeign = image != nullptr && studyInstanceUID != nullptr &&
-                               image->uid(TagMap::StudyLevel) != studyInstanceUID;
-        if (image != nullptr && (isForeign || !sources.isListed(*image, name))) {
-            if (isForeign)
-                LogFile::warnf(kForeign, path.c_str(), studyInstanceUID);
-            else
-                LogFile::errorf("%s is not the image that was registered any more", path.c_str());
-            image.reset();
-        }
-    }
+    std::unique_ptr<TagMap> image = isUndecided ? nullptr : readListed(path, studyInstanceUID, sources);
     if (image == nullptr) {
         image = isUndecided ? sources.formerImages.copy(path) : sources.copyFormer(path);
         if (!isUndecided)
@@ -219,6 +217,28 @@ void TagFileGenerator::addFile(TagFile& tagFile, const std::string& path, const 
             sources.corrections.applyToFormer(*image);
     }
     addImage(tagFile, std::move(image), path, studyInstanceUID);
+}
+
+/// The image that the database lists for the file, as corrections make it; null, with the reason logged, when the file
+/// has no such image.
+std::unique_ptr<TagMap> TagFileGenerator::readListed(const std::string& path, const char* studyInstanceUID,
+                                                     StudySources& sources)
+{
+    const QByteArray name = QByteArray::fromStdString(path);
+    std::unique_ptr<TagMap> image = sources.loaded.copy(path);
+    if (image == nullptr)
+        image = load(path, sources);
+    if (image == nullptr || !sources.corrections.applyTo(*image, name))
+        return nullptr;
+    if (studyInstanceUID != nullptr && image->uid(TagMap::StudyLevel) != studyInstanceUID) {
+        LogFile::warnf(kForeign, path.c_str(), studyInstanceUID);
+        return nullptr;
+    }
+    if (!sources.isListed(*image, name)) {
+        LogFile::errorf("%s is not the image that was registered any more", path.c_str());
+        return nullptr;
+    }
+    return image;
 }
 
 /// The image as the file has it; null, with the reason logged, when it cannot be read.
@@ -244,8 +264,7 @@ bool TagFileGenerator::addImage(TagFile& tagFile, std::unique_ptr<TagMap> image,
     const bool isForeign = studyInstanceUID != nullptr && tagFile.isEmpty() &&
                            image->uid(TagMap::StudyLevel) != studyInstanceUID;
     const int before = tagFile.imagesByUID().size();
-    TagMap* placed = isForeign ? nullptr : tagFile.addTagMap(image.release(), path.c_str(), true);
-    if (placed == nullptr) {
+    if (isForeign || place(tagFile, std::move(image), QByteArray::fromStdString(path)) == nullptr) {
         LogFile::warnf(kForeign, path.c_str(),
                        studyInstanceUID != nullptr ? studyInstanceUID
                                                    : tagFile.studyInstanceUID().constData());
@@ -253,9 +272,16 @@ bool TagFileGenerator::addImage(TagFile& tagFile, std::unique_ptr<TagMap> image,
     }
     if (tagFile.imagesByUID().size() == before)
         LogFile::warnf("%s replaces another file of the same SOP Instance UID", path.c_str());
-    // Who reads the tag file finds the image without asking the database; a sync keeps the path up to date.
-    placed->putAndInsertValue(kFilePath, VrCode::LO, QByteArray::fromStdString(path));
     return true;
+}
+
+TagMap* TagFileGenerator::place(TagFile& tagFile, std::unique_ptr<TagMap> image, const QByteArray& path)
+{
+    TagMap* placed = tagFile.addTagMap(image.release(), path.constData(), true);
+    // Who reads the tag file finds the image without asking the database; a sync keeps the path up to date.
+    if (placed != nullptr)
+        placed->putAndInsertValue(kFilePath, VrCode::LO, path);
+    return placed;
 }
 
 /// Of the images chosen those that are held.

@@ -1,6 +1,7 @@
 #pragma once
 
 #include "platform/base/Export.h"
+#include "platform/base/Result.h"
 #include "platform/base/Stopwatch.h"
 
 #include <QByteArray>
@@ -61,6 +62,15 @@ public:
     /// The same with the present cache file at hand; empty: there is none. Afterwards `present` shows the arrivals too.
     void completeArrivals(TagFile& arrivals, TagFile& present);
 
+    /// Adds an image that was made of the file at `path` to a study's tree, as builds do: it takes the place of one of
+    /// the same SOP Instance UID, and names its file. Null, and it is destroyed, when it is of another study; else the
+    /// tree owns it.
+    static TagMap* place(TagFile& tagFile, std::unique_ptr<TagMap> image, const QByteArray& path);
+
+    /// Removes the tag file of a study that has no images any more, waiting some minutes for whoever holds it. Success
+    /// when there is none.
+    static Result removeTagFile(const QByteArray& studyInstanceUID);
+
     /// Of the images of the last build whose files could not be read: those that are as the earlier tag file had them,
     /// and those that are missing.
     int numKept() const { return mNumKept; }
@@ -80,6 +90,8 @@ protected:
 private:
     void addFile(TagFile& tagFile, const std::string& path, const char* studyInstanceUID,
                  StudySources& sources);
+    std::unique_ptr<TagMap> readListed(const std::string& path, const char* studyInstanceUID,
+                                       StudySources& sources);
     std::unique_ptr<TagMap> load(const std::string& path, StudySources& sources);
     void addVolumes(TagFile& tagFile, const std::vector<std::string>& volumeFiles, StudySources& sources);
     static bool write(TagFile& tagFile, StudySources& sources);

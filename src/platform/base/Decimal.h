@@ -1,5 +1,8 @@
 #pragma once
 
+#include <QByteArray>
+#include <QVector>
+
 namespace Kdd
 {
 
@@ -7,5 +10,8 @@ namespace Kdd
 /// program that has chosen no locale: what separates decimals is a point on every machine, also where people write a
 /// comma. A host may switch the locale at any time and for reasons of its own.
 double decimalNumber(const char* text);
+
+/// The numbers of a multi-valued DICOM text; none when one of them is no number or not finite.
+QVector<double> numbersOf(const QByteArray& text);
 
 }  // namespace Kdd

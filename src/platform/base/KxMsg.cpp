@@ -24,6 +24,7 @@ KxMsg& KxMsg::take(T& value)
     return *this;
 }
 
+/// A failure is for good: what would be read after it is out of step.
 bool KxMsg::has(qint64 count)
 {
     if (!mFailed && count >= 0 && count <= remaining())
@@ -132,6 +133,7 @@ KxMsg KxMsg::readMessage(qint64 count)
         failed.setFailed();
         return failed;
     }
+    // Not copied: a study's messages hold each other, and every level would cost its bytes once more.
     KxMsg part(QByteArray::fromRawData(mBytes.constData() + mRead, static_cast<int>(count)));
     mRead += static_cast<int>(count);
     return part;

@@ -16,8 +16,15 @@ void recordCorrection(SqlConnection& connection, const ImageCorrection& correcti
 /// Of images that are or were in the study.
 std::vector<ImageCorrection> correctionsOf(SqlConnection& connection, const QByteArray& studyUID);
 
+/// A correction with the number under which it is kept.
+struct KeptCorrection
+{
+    ImageCorrection correction;
+    qint64 id = 0;
+};
+
 /// Of images by what their files say of them: SOP Instance UIDs, or paths where there is none.
-std::vector<ImageCorrection> correctionsOfImages(SqlConnection& connection, const QList<QByteArray>& images);
+std::vector<KeptCorrection> correctionsOfImages(SqlConnection& connection, const QList<QByteArray>& images);
 
 /// Whether there is any correction at all: in most archives there are none or few.
 bool hasCorrections(SqlConnection& connection);

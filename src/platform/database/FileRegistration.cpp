@@ -2,7 +2,6 @@
 
 #include "platform/database/CorrectionRows.h"
 #include "platform/database/SqlConnection.h"
-#include "platform/database/StudyContent.h"
 #include "platform/database/StudyDescription.h"
 
 #include <algorithm>
@@ -31,7 +30,8 @@ struct FileRegistration::Entry
     QByteArray studyUID, seriesUID, sopUID;
     const DicomFileRecord* attributes = nullptr;  // null when the file says nothing of its study and series
     qint64 studyId = 0;
-    QVariant seriesId = QVariant(QVariant::LongLong);  // null for what belongs to none
+    QVariant seriesId = QVariant(QVariant::LongLong);      // null for what belongs to none
+    QVariant correctionId = QVariant(QVariant::LongLong);  // of the one that it follows; null for none
     bool isShown = true;
 
     bool isNamedImage() const { return kind == FileKind::Dicom && !sopUID.isEmpty(); }
@@ -95,22 +95,24 @@ void FileRegistration::followCorrections(std::vector<Entry>& entries)
     QList<QByteArray> images;
     for (const Entry& entry : entries)
         images.append(entry.sopUID.isEmpty() ? entry.path : entry.sopUID);
-    QHash<QPair<QByteArray, QByteArray>, ImageCorrection> known;
-    for (const ImageCorrection& correction : correctionsOfImages(mConnection, images))
-        known.insert({correction.studyInstanceUID, correction.image}, correction);
+    QHash<QPair<QByteArray, QByteArray>, KeptCorrection> known;
+    for (const KeptCorrection& kept : correctionsOfImages(mConnection, images))
+        known.insert({kept.correction.studyInstanceUID, kept.correction.image}, kept);
     for (std::size_t i = 0; i < entries.size(); ++i) {
         Entry& entry = entries[i];
         const auto found = known.constFind({entry.studyUID, images.at(static_cast<int>(i))});
         if (entry.kind != FileKind::Dicom || found == known.cend())
             continue;
-        if (found->shownStudyUID != entry.studyUID)
+        const ImageCorrection& correction = found->correction;
+        if (correction.shownStudyUID != entry.studyUID)
             mOutcome->conflicts.push_back({FileConflict::Kind::FollowsCorrection, entry.path, entry.sopUID,
-                                           entry.studyUID, QByteArray(), found->shownStudyUID});
-        entry.studyUID = found->shownStudyUID;
-        if (!found->shownSeriesUID.isEmpty())
-            entry.seriesUID = found->shownSeriesUID;
-        if (found->shownImage != entry.path)
-            entry.sopUID = found->shownImage;
+                                           entry.studyUID, QByteArray(), correction.shownStudyUID});
+        entry.studyUID = correction.shownStudyUID;
+        if (!correction.shownSeriesUID.isEmpty())
+            entry.seriesUID = correction.shownSeriesUID;
+        if (correction.shownImage != entry.path)
+            entry.sopUID = correction.shownImage;
+        entry.correctionId = found->id;
     }
 }
 
@@ -134,15 +136,16 @@ void FileRegistration::write(const std::vector<Entry>& entries)
     for (const Entry& entry : entries)
         values << bytesValue(entry.path) << entry.stamp.size << entry.stamp.modified
                << static_cast<int>(entry.kind) << entry.seriesId << textValue(entry.sopUID) << mNumber++
-               << (entry.isShown ? 1 : 0) << (entry.attributes && entry.attributes->isDamaged ? 1 : 0);
+               << (entry.isShown ? 1 : 0) << (entry.attributes && entry.attributes->isDamaged ? 1 : 0)
+               << entry.correctionId;
     mConnection.change(
         "INSERT INTO file (path, size, modified, kind, series_id, sop_uid, registered, is_shown,"
-        " is_damaged) VALUES " +
-            repeated("(?, ?, ?, ?, ?, ?, ?, ?, ?)", static_cast<int>(entries.size())) +
+        " is_damaged, correction_id) VALUES " +
+            repeated("(?, ?, ?, ?, ?, ?, ?, ?, ?, ?)", static_cast<int>(entries.size())) +
             " ON CONFLICT (path) DO UPDATE SET size = excluded.size, modified = excluded.modified,"
             " kind = excluded.kind, series_id = excluded.series_id, sop_uid = excluded.sop_uid,"
             " registered = excluded.registered, is_shown = excluded.is_shown,"
-            " is_damaged = excluded.is_damaged",
+            " is_damaged = excluded.is_damaged, correction_id = excluded.correction_id",
         values);
 }
 
@@ -223,8 +226,8 @@ void FileRegistration::tellConflict(const Entry& entry, const Entry& other)
 
 void FileRegistration::place(Entry& entry)
 {
-    Known& study = knownStudy(entry.studyUID);
-    Known& series = knownSeries(study.id, entry.seriesUID);
+    KeptNode& study = knownStudy(entry.studyUID);
+    KeptNode& series = knownSeries(study.id, entry.seriesUID);
     mTouched.insert(study.id);
     if (entry.attributes && !study.isDescribed) {
         describeStudy(mConnection, study.id, *entry.attributes);
@@ -238,38 +241,19 @@ void FileRegistration::place(Entry& entry)
     entry.seriesId = series.id;
 }
 
-FileRegistration::Known& FileRegistration::knownStudy(const QByteArray& uid)
+KeptNode& FileRegistration::knownStudy(const QByteArray& uid)
 {
-    Known& study = mStudies[uid];
-    if (study.id != 0)
-        return study;
-    const QVariant text = textValue(uid);
-    SqlRows found = mConnection.ask("SELECT id, is_described FROM study WHERE uid = ?", {text});
-    if (found.next()) {
-        study = {found.number(0), found.number(1) != 0};
-    } else {
-        SqlRows made = mConnection.ask("INSERT INTO study (uid) VALUES (?) RETURNING id", {text});
-        if (made.next())
-            study.id = made.number(0);
-    }
+    KeptNode& study = mStudies[uid];
+    if (study.id == 0)
+        study = obtainStudy(mConnection, uid);
     return study;
 }
 
-FileRegistration::Known& FileRegistration::knownSeries(qint64 studyId, const QByteArray& uid)
+KeptNode& FileRegistration::knownSeries(qint64 studyId, const QByteArray& uid)
 {
-    Known& series = mSeries[{studyId, uid}];
-    if (series.id != 0)
-        return series;
-    const QVariantList key = {studyId, textValue(uid)};
-    SqlRows found =
-        mConnection.ask("SELECT id, is_described FROM series WHERE study_id = ? AND uid = ?", key);
-    if (found.next()) {
-        series = {found.number(0), found.number(1) != 0};
-    } else {
-        SqlRows made = mConnection.ask("INSERT INTO series (study_id, uid) VALUES (?, ?) RETURNING id", key);
-        if (made.next())
-            series.id = made.number(0);
-    }
+    KeptNode& series = mSeries[{studyId, uid}];
+    if (series.id == 0)
+        series = obtainSeries(mConnection, studyId, uid);
     return series;
 }
 

@@ -2,6 +2,7 @@
 
 #include "platform/database/Catalogue.h"
 #include "platform/database/FileKind.h"
+#include "platform/database/StudyContent.h"
 
 #include <QPair>
 
@@ -26,13 +27,6 @@ public:
 private:
     struct Entry;
 
-    /// A study or series that was met in this transaction.
-    struct Known
-    {
-        qint64 id = 0;
-        bool isDescribed = false;
-    };
-
     /// An image of a study, by the study's id and the image's SOP Instance UID.
     using Image = QPair<qint64, QByteArray>;
 
@@ -40,8 +34,8 @@ private:
     void followCorrections(std::vector<Entry>& entries);
     void put(std::vector<Entry> entries);
     void place(Entry& entry);
-    Known& knownStudy(const QByteArray& uid);
-    Known& knownSeries(qint64 studyId, const QByteArray& uid);
+    KeptNode& knownStudy(const QByteArray& uid);
+    KeptNode& knownSeries(qint64 studyId, const QByteArray& uid);
     QHash<QByteArray, Image> formerImages(const std::vector<Entry>& entries);
     void settleConflicts(std::vector<Entry>& entries);
     void tellConflict(const Entry& entry, const Entry& other);
@@ -49,9 +43,9 @@ private:
 
     SqlConnection& mConnection;
     RegistrationOutcome* mOutcome = nullptr;
-    qint64 mNumber = 0;  // of the next file
-    QHash<QByteArray, Known> mStudies;
-    QHash<QPair<qint64, QByteArray>, Known> mSeries;
+    qint64 mNumber = 0;                    // of the next file
+    QHash<QByteArray, KeptNode> mStudies;  // that were met in this transaction
+    QHash<QPair<qint64, QByteArray>, KeptNode> mSeries;
     QSet<qint64> mTouched;
     QSet<Image> mLeft;  // images whose shown file may be another one now
 };

@@ -31,11 +31,10 @@ StudyFiles readFiles(SqlConnection& connection, int studyId)
     StudyFiles files;
     for (const ListedImage& image : listImages(connection, studyId))
         files.dicom.push_back(image.path.toStdString());
-    for (const ListedVolume& volume : listVolumes(connection, studyId)) {
-        if (files.volumes.isEmpty() || files.volumes.last() != volume.path)
-            files.volumes.append(volume.path);
+    const std::vector<ListedVolume> volumes = listVolumes(connection, studyId);
+    files.volumes = pathsOf(volumes);
+    for (const ListedVolume& volume : volumes)
         files.withVolume.insert(volume.seriesInstanceUID.toStdString());
-    }
     std::sort(files.volumes.begin(), files.volumes.end(), Kdd::isEarlierPart);
     // Without files it is about to be forgotten.
     if (files.dicom.empty() && files.volumes.empty())

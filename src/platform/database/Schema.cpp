@@ -78,6 +78,20 @@ const QStringList kSteps[] = {
                        " PRIMARY KEY (path, series_id))"),
         QStringLiteral("CREATE INDEX volume_share_of_series ON volume_share (series_id)"),
     },
+    {
+        // The correction that put a file where it is listed; null: it is where it says itself. Where a moved image has
+        // taken over from another of its UID, nothing else tells the files of the two apart.
+        QStringLiteral("ALTER TABLE file ADD COLUMN correction_id BIGINT"),
+        QStringLiteral(
+            "CREATE INDEX file_of_correction ON file (correction_id) WHERE correction_id IS NOT NULL"),
+        // So far all of them counted as the moved image's.
+        QStringLiteral(
+            "UPDATE file SET correction_id = (SELECT MAX(correction.id) FROM series"
+            " JOIN study ON study.id = series.study_id"
+            " JOIN correction ON correction.shown_study_uid = study.uid WHERE series.id = file.series_id"
+            " AND correction.shown_image = CASE WHEN file.sop_uid = '' THEN file.path"
+            " ELSE {bytes of file.sop_uid} END) WHERE kind = 1 AND EXISTS (SELECT 1 FROM correction)"),
+    },
 };
 
 QString firstRow(SqlConnection& connection, const QString& question)
@@ -123,6 +137,8 @@ void takeStep(SqlConnection& connection, int version)
         statement.replace(QLatin1String("{id}"), dialect.id);
         statement.replace(QLatin1String("{text}"), dialect.text);
         statement.replace(QLatin1String("{bytes}"), dialect.bytes);
+        statement.replace(QLatin1String("{bytes of file.sop_uid}"),
+                          dialect.bytesOf.arg(QLatin1String("file.sop_uid")));
         connection.execute(statement);
     }
     connection.execute(QStringLiteral("UPDATE schema_version SET version = %1").arg(version + 1));

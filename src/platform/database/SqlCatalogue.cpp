@@ -208,10 +208,7 @@ Kdd::Result SqlCatalogue::studyContents(const QByteArray& studyUID, StudyContent
         const qint64 studyId = findStudyId(mConnection, studyUID);
         contents.id = static_cast<int>(studyId);
         contents.images = listImages(mConnection, studyId);
-        for (const ListedVolume& volume : listVolumes(mConnection, studyId)) {
-            if (contents.volumes.isEmpty() || contents.volumes.last() != volume.path)
-                contents.volumes.append(volume.path);
-        }
+        contents.volumes = pathsOf(listVolumes(mConnection, studyId));
         contents.isCorrected = !correctionsOf(mConnection, studyUID).empty();
         SqlRows rows =
             mConnection.ask("SELECT tag_file_size, tag_file_digest,"

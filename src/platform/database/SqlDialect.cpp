@@ -20,6 +20,7 @@ SqlDialect sqlite()
     dialect.id = QStringLiteral("INTEGER PRIMARY KEY AUTOINCREMENT");
     dialect.text = QStringLiteral("TEXT");
     dialect.bytes = QStringLiteral("BLOB");
+    dialect.bytesOf = QStringLiteral("CAST(%1 AS BLOB)");
     return dialect;
 }
 
@@ -50,6 +51,7 @@ SqlDialect postgres()
     dialect.id = QStringLiteral("BIGINT GENERATED ALWAYS AS IDENTITY PRIMARY KEY");
     dialect.text = QStringLiteral("TEXT COLLATE \"C\"");
     dialect.bytes = QStringLiteral("BYTEA");
+    dialect.bytesOf = QStringLiteral("convert_to(%1, 'UTF8')");
     return dialect;
 }
 

@@ -27,6 +27,8 @@ struct SqlDialect
     QString text;   ///< UTF-8, in the order of its bytes
     QString bytes;  ///< likewise
 
+    QString bytesOf;  ///< the bytes of a text, which stands in place of %1
+
     static const SqlDialect& of(DatabaseAddress::Engine engine);
 };
 

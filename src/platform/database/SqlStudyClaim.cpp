@@ -13,6 +13,7 @@ namespace Kxg
 namespace
 {
 
+// Mostly the first request is free, but where many builders work the first dozens are taken.
 constexpr int kPageOfQueue = 64;      // [requests]
 constexpr unsigned long kPause = 20;  // [ms]
 
@@ -113,6 +114,7 @@ private:
     Kdd::Result conclude(const QVector<qint64>& done, const std::function<void()>& work)
     {
         return attempt(mConnection.address(), [&] {
+            // A lock that was lost may be another builder's by now, whose work must not be overwritten.
             mLock->confirm();
             mConnection.transact(SqlConnection::Access::Write, [&] {
                 deleteRequests(mConnection, done);
@@ -239,7 +241,7 @@ std::unique_ptr<StudyClaim> tryClaim(SqlConnection& connection, std::unique_ptr<
     });
     if (studyId == 0)
         connection.transact(SqlConnection::Access::Write,
-                            [&] { studyId = obtainStudy(connection, studyUID); });
+                            [&] { studyId = obtainStudy(connection, studyUID).id; });
     if (!lock->tryLock(studyId))
         return nullptr;
     LockedStudy study = readLocked(connection, studyId);

@@ -1,3 +1,4 @@
+#include "platform/base/SystemFailure.h"
 #include "platform/database/SqlConnection.h"
 #include "platform/database/StudyLock.h"
 
@@ -5,7 +6,6 @@
 #include <unistd.h>
 
 #include <cerrno>
-#include <system_error>
 
 namespace Kxg
 {
@@ -58,8 +58,7 @@ private:
     [[noreturn]] void fail(const char* action, int error) const
     {
         throw DatabaseError(QStringLiteral("cannot %1 %2: %3")
-                                .arg(QString::fromLatin1(action), mPath,
-                                     QString::fromLocal8Bit(std::system_category().message(error).c_str())));
+                                .arg(QString::fromLatin1(action), mPath, Kdd::systemFailure(error).text()));
     }
 
     const QString mPath;

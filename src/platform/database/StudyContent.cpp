@@ -6,6 +6,22 @@
 
 namespace Kxg
 {
+namespace
+{
+
+KeptNode obtain(SqlConnection& connection, const char* search, const char* make, const QVariantList& key)
+{
+    // The answer goes before the next statement runs, as rows come from the engine one by one.
+    {
+        SqlRows found = connection.ask(search, key);
+        if (found.next())
+            return {found.number(0), found.number(1) != 0};
+    }
+    SqlRows made = connection.ask(make, key);
+    return {made.next() ? made.number(0) : 0, false};
+}
+
+}  // namespace
 
 qint64 findStudyId(SqlConnection& connection, const QByteArray& studyUID)
 {
@@ -21,25 +37,17 @@ qint64 obtainStudyId(SqlConnection& connection, const QByteArray& studyUID)
     return id;
 }
 
-qint64 obtainStudy(SqlConnection& connection, const QByteArray& studyUID)
+KeptNode obtainStudy(SqlConnection& connection, const QByteArray& studyUID)
 {
-    const qint64 id = findStudyId(connection, studyUID);
-    if (id != 0)
-        return id;
-    SqlRows made = connection.ask("INSERT INTO study (uid) VALUES (?) RETURNING id", {textValue(studyUID)});
-    return made.next() ? made.number(0) : 0;
+    return obtain(connection, "SELECT id, is_described FROM study WHERE uid = ?",
+                  "INSERT INTO study (uid) VALUES (?) RETURNING id", {textValue(studyUID)});
 }
 
-qint64 obtainSeries(SqlConnection& connection, qint64 studyId, const QByteArray& seriesUID)
+KeptNode obtainSeries(SqlConnection& connection, qint64 studyId, const QByteArray& seriesUID)
 {
-    const QVariantList key = {studyId, textValue(seriesUID)};
-    {
-        SqlRows found = connection.ask("SELECT id FROM series WHERE study_id = ? AND uid = ?", key);
-        if (found.next())
-            return found.number(0);
-    }
-    SqlRows made = connection.ask("INSERT INTO series (study_id, uid) VALUES (?, ?) RETURNING id", key);
-    return made.next() ? made.number(0) : 0;
+    return obtain(connection, "SELECT id, is_described FROM series WHERE study_id = ? AND uid = ?",
+                  "INSERT INTO series (study_id, uid) VALUES (?, ?) RETURNING id",
+                  {studyId, textValue(seriesUID)});
 }
 
 qint64 leaveRequest(SqlConnection& connection, qint64 studyId, qint64 due)
@@ -52,6 +60,7 @@ qint64 leaveRequest(SqlConnection& connection, qint64 studyId, qint64 due)
 
 void concludeChange(SqlConnection& connection, qint64 studyId, QMap<QByteArray, qint64>& requests)
 {
+    // Before the request is left, so that whoever reads the study for it finds no series without files.
     connection.change("DELETE FROM series WHERE study_id = ?"
                       " AND NOT EXISTS (SELECT 1 FROM file WHERE file.series_id = series.id)",
                       {studyId});

@@ -16,9 +16,16 @@ qint64 findStudyId(SqlConnection& connection, const QByteArray& studyUID);
 /// Likewise; throws when it is not there.
 qint64 obtainStudyId(SqlConnection& connection, const QByteArray& studyUID);
 
-/// The id of a study or series, which is made when it is not there.
-qint64 obtainStudy(SqlConnection& connection, const QByteArray& studyUID);
-qint64 obtainSeries(SqlConnection& connection, qint64 studyId, const QByteArray& seriesUID);
+/// A study or series as it is kept.
+struct KeptNode
+{
+    qint64 id = 0;
+    bool isDescribed = false;
+};
+
+/// A study or series, which is made when it is not there.
+KeptNode obtainStudy(SqlConnection& connection, const QByteArray& studyUID);
+KeptNode obtainSeries(SqlConnection& connection, qint64 studyId, const QByteArray& seriesUID);
 
 /// To be called once for each study touched, after everything else: removes its series that have become empty, leaves a
 /// request to build it and enters that by the study's UID. The study itself stays, also without files: whoever builds it

@@ -33,4 +33,14 @@ std::vector<ListedVolume> listVolumes(SqlConnection& connection, qint64 studyId)
     return volumes;
 }
 
+QVector<QByteArray> pathsOf(const std::vector<ListedVolume>& volumes)
+{
+    QVector<QByteArray> paths;
+    for (const ListedVolume& volume : volumes) {
+        if (paths.isEmpty() || paths.last() != volume.path)
+            paths.append(volume.path);
+    }
+    return paths;
+}
+
 }  // namespace Kxg

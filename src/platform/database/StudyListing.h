@@ -21,4 +21,7 @@ struct ListedVolume
 /// The volume files of a study's series, and those that hold images which a correction brought here, by path.
 std::vector<ListedVolume> listVolumes(SqlConnection& connection, qint64 studyId);
 
+/// Each file once, although several series may have it.
+QVector<QByteArray> pathsOf(const std::vector<ListedVolume>& volumes);
+
 }  // namespace Kxg

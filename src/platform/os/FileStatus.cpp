@@ -1,5 +1,7 @@
 #include "platform/os/FileStatus.h"
 
+#include "platform/os/PathName.h"
+
 #include <sys/stat.h>
 
 namespace Kdd
@@ -14,6 +16,14 @@ bool statusOf(const char* path, FileStatus& status)
     status.size = found.st_size;
     status.modified = found.st_mtim.tv_sec * kNanosecondsPerSecond + found.st_mtim.tv_nsec;
     return true;
+}
+
+FilePresence presenceOf(const QString& path)
+{
+    FileStatus status;
+    if (!statusOf(pathBytes(path).constData(), status))
+        return FilePresence::Absent;
+    return status.size == 0 ? FilePresence::Empty : FilePresence::Filled;
 }
 
 }  // namespace Kdd

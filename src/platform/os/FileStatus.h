@@ -2,7 +2,7 @@
 
 #include "platform/base/Export.h"
 
-#include <QtGlobal>
+#include <QString>
 
 namespace Kdd
 {
@@ -16,5 +16,9 @@ struct FileStatus
 
 /// Links are followed. False when there is no such file or it cannot be asked for.
 KDD_EXPORT bool statusOf(const char* path, FileStatus& status);
+
+/// What can be told of a file without opening it. One without bytes was just being made, perhaps by a process that died.
+enum class FilePresence { Absent, Empty, Filled };
+KDD_EXPORT FilePresence presenceOf(const QString& path);
 
 }  // namespace Kdd

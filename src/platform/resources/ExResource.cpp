@@ -10,6 +10,8 @@
 #include <QStandardPaths>
 #include <QStringList>
 
+#include <limits>
+
 namespace Kdd
 {
 namespace
@@ -90,6 +92,19 @@ QByteArray endpoint(const Setting& setting)
     return address.endsWith('/') ? address : address + '/';
 }
 
+/// Of 0 to `most`; of anything else the standard, for a site's slip should not stop its server.
+int numberOf(const Setting& setting, int most)
+{
+    const QByteArray text = valueOf(setting);
+    bool isNumber = false;
+    const int number = text.toInt(&isNumber);
+    if (isNumber && number >= 0 && number <= most)
+        return number;
+    LogFile::warnf("%s is \"%s\", which is no number of 0 to %d; %s is taken", setting.variable,
+                   text.constData(), most, setting.standard);
+    return QByteArray(setting.standard).toInt();
+}
+
 }  // namespace
 
 QByteArray ExResource::getWebServiceHostExternal()
@@ -144,15 +159,7 @@ QByteArray ExResource::tlsCaFile()
 
 int ExResource::readPatience()
 {
-    constexpr int kMost = 600000;
-    const QByteArray text = valueOf(kReadPatience);
-    bool isNumber = false;
-    const int patience = text.toInt(&isNumber);
-    if (isNumber && patience >= 0 && patience <= kMost)
-        return patience;
-    LogFile::warnf("%s is \"%s\", which is no number of 0 to %d", kReadPatience.variable, text.constData(),
-                   kMost);
-    return QByteArray(kReadPatience.standard).toInt();
+    return numberOf(kReadPatience, 600000);
 }
 
 QByteArray ExResource::sessionHosts()
@@ -162,14 +169,7 @@ QByteArray ExResource::sessionHosts()
 
 int ExResource::settleSeconds()
 {
-    const QByteArray value = valueOf(kSettleSeconds);
-    bool isNumber = false;
-    const int seconds = value.toInt(&isNumber);
-    if (isNumber && seconds >= 0)
-        return seconds;
-    LogFile::warnf("The setting %s is \"%s\", which is no number of seconds; %s is taken",
-                   kSettleSeconds.variable, value.constData(), kSettleSeconds.standard);
-    return QByteArray(kSettleSeconds.standard).toInt();
+    return numberOf(kSettleSeconds, std::numeric_limits<int>::max());
 }
 
 bool ExResource::sharesConnections()

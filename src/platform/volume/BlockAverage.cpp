@@ -63,6 +63,7 @@ void average(const TypedData2D& pixels, int factor, double blank, TypedData2D& m
     }
 }
 
+/// Previews know neither 32-bit counts nor doubles.
 template <typename T>
 using Shown = std::conditional_t<std::is_same_v<T, quint32> || std::is_same_v<T, double>, float, T>;
 
@@ -79,6 +80,7 @@ TypedData2D averageBlocks(const TypedData2D& pixels, int factor, double blank, M
 {
     return visitPixelType(pixels.type, [&](auto zero) {
         using From = decltype(zero);
+        // Nothing to average and nothing to blank: whole numbers always have a value.
         if (factor == 1 && std::is_integral_v<From> && std::is_same_v<From, Shown<From>>)
             return pixels;
         const bool isFloat = means == Means::Exact || !std::is_same_v<From, Shown<From>>;

@@ -97,6 +97,8 @@ Items selectByStart(const Items& fragments, int frame, DcmFileCache& file)
 Items selectFragments(const Items& items, int frame, int frames, DcmFileCache& file)
 {
     const Items fragments = items.mid(1);
+    // The offset table comes late, because many writers leave it empty and some fill it wrongly; how many fragments
+    // there are cannot be wrong.
     if (frames == 1)
         return fragments;
     if (fragments.size() == frames)
@@ -111,6 +113,7 @@ Result readFragments(const Items& fragments, DcmFileCache& file, QByteArray& byt
     qint64 size = 0;
     for (DcmPixelItem* item : fragments)
         size += lengthOf(*item);
+    // What the file claims is held against a bound before memory is taken for it.
     if (size > kMaxFrameBytes)
         return Result::failure(QStringLiteral("A compressed frame of %1 bytes is too large").arg(size));
     bytes = QByteArray(static_cast<int>(size), Qt::Uninitialized);

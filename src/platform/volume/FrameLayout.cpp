@@ -78,6 +78,7 @@ Result readFrameLayout(DcmItem& dataset, FrameLayout& layout)
     layout.columns = numberOf(dataset, DCM_Columns, 0);
     layout.samples = numberOf(dataset, DCM_SamplesPerPixel, 1);
     layout.frames = numberOfFrames(dataset);
+    // Float images have an element of their own in place of Pixel Data, and it tells the bits.
     layout.isFloat = !dataset.tagExists(DCM_PixelData);
     const bool isDouble = layout.isFloat && dataset.tagExists(DCM_DoubleFloatPixelData);
     layout.bitsAllocated = layout.isFloat ? (isDouble ? 64 : 32) : numberOf(dataset, DCM_BitsAllocated, 0);
@@ -88,6 +89,7 @@ Result readFrameLayout(DcmItem& dataset, FrameLayout& layout)
     const auto* whole = dynamic_cast<DcmDataset*>(&dataset);
     layout.isBigEndian = whole && whole->getOriginalXfer() == EXS_BigEndianExplicit;
     layout.photometric = textOf(dataset, DCM_PhotometricInterpretation);
+    // First mended, then checked: what is left to refuse is only what nobody can decode.
     mendStoredBits(layout);
     const Result bits = checkBits(layout);
     return bits.bad() ? bits : checkSize(layout);

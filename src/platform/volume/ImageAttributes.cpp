@@ -1,12 +1,10 @@
 #include "platform/volume/ImageAttributes.h"
 
-#include <QList>
+#include "platform/base/Decimal.h"
 
 #include <dcmtk/dcmdata/dcdeftag.h>
 #include <dcmtk/dcmdata/dcelem.h>
 #include <dcmtk/dcmdata/dcitem.h>
-
-#include <cmath>
 
 namespace Kdd
 {
@@ -15,18 +13,6 @@ namespace
 {
 
 constexpr int kMaxTextBytes = 1024;
-
-QVector<double> numbersOf(DcmItem& item, const DcmTagKey& key)
-{
-    QVector<double> numbers;
-    for (const QByteArray& word : textOf(item, key).split('\\')) {
-        bool isNumber = false;
-        numbers.append(word.trimmed().toDouble(&isNumber));
-        if (!isNumber || !std::isfinite(numbers.last()))
-            return {};
-    }
-    return numbers;
-}
 
 }  // namespace
 
@@ -68,7 +54,7 @@ DcmItem* ImageAttributes::find(const DcmTagKey& group, const DcmTagKey& key) con
 QVector<double> ImageAttributes::numbers(const DcmTagKey& group, const DcmTagKey& key) const
 {
     DcmItem* item = find(group, key);
-    return item ? numbersOf(*item, key) : QVector<double>();
+    return item ? numbersOf(textOf(*item, key)) : QVector<double>();
 }
 
 double believableAspect(double width, double height)

@@ -1,6 +1,7 @@
 #include "platform/volume/KxCompressedDataMedia.h"
 
 #include "platform/base/LogFile.h"
+#include "platform/base/SystemFailure.h"
 #include "platform/os/PathName.h"
 #include "platform/os/RandomAccessFile.h"
 #include "platform/volume/ffmpeg/VideoModule.h"
@@ -17,7 +18,6 @@
 #include <cmath>
 #include <limits>
 #include <new>
-#include <system_error>
 
 namespace Kdd
 {
@@ -32,7 +32,7 @@ public:
     {
         const int error = mFile.open(pathBytes(path).constData());
         if (error != 0)
-            return Result::failure(QString::fromLocal8Bit(std::system_category().message(error).c_str()));
+            return systemFailure(error);
         if (offset < 0 || size <= 0 || offset >= mFile.size())
             return Result::failure(QStringLiteral("there are no %1 bytes at %2").arg(size).arg(offset));
         mOffset = offset;

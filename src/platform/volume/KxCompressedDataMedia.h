@@ -25,6 +25,9 @@ public:
 class KDD_EXPORT KxCompressedDataMedia
 {
 public:
+    /// Of the duration, where a frame shows what a video is about: its beginning is often black.
+    static constexpr double kRepresentative = 0.3;
+
     /// The frame at `fraction` (0 to 1) of the duration, RGB, scaled down to fit into `width` x `height` with its own
     /// aspect (pixels that are not square are made square); never enlarged. No more is read than finding and decoding
     /// that frame takes. Failure: the module is missing, or nothing in the source can be decoded.

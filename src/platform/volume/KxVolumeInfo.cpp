@@ -20,8 +20,6 @@ namespace
 
 using Info = std::shared_ptr<KxVolumeInfo>;
 
-constexpr double kVideoFraction = 0.3;
-
 Info infoOf(const ShownPixels& shown, double aspect, bool isInverted)
 {
     const ShownPixels spread = spreadNarrowRange(shown);
@@ -95,7 +93,8 @@ Info showVideo(DcmPixelSequence& fragments, int width, int height, Result& resul
 {
     FragmentSource source(fragments);
     TypedData2D frame;
-    result = KxCompressedDataMedia::decodeRepresentativeFrame(source, width, height, kVideoFraction, frame);
+    result = KxCompressedDataMedia::decodeRepresentativeFrame(source, width, height,
+                                                              KxCompressedDataMedia::kRepresentative, frame);
     return result.good() ? KxVolumeInfo::fromFrame(nullptr, frame) : nullptr;
 }
 

@@ -93,6 +93,7 @@ Result OrlanMeshWriter::Private::checkSlice(int slice, const TypedData2D& pixels
 
 bool OrlanMeshWriter::Private::closeFile()
 {
+    // The file itself last: what is still open in it would keep the library from finishing it.
     data = ChunkedData();
     const bool isClosed = dataSections.close();
     return file.close() && isClosed;

@@ -20,6 +20,10 @@ struct ParameterBudget
     qint64 bytes = kMaxParameterBytes;
 };
 
+/// Takes one parameter of so many bytes from the budget; failure when that is too small. Writers ask it too, so that
+/// nothing is written that would not be read.
+Result spend(ParameterBudget& budget, qint64 bytes);
+
 /// Reads an attribute that is a parameter.
 Result readAttribute(hid_t object, const QByteArray& name, ParameterBudget& budget, Parameter& parameter);
 

@@ -45,18 +45,6 @@ Parameter parameterFrom(Parameter::Kind kind, const QByteArray& bytes)
     return Parameter::ofText(end < 0 ? bytes : bytes.left(end));
 }
 
-Result spend(ParameterBudget& budget, qint64 bytes)
-{
-    if (budget.parameters < 1)
-        return Result::failure(QStringLiteral("is one of more than %1 parameters").arg(kMaxParameters));
-    if (budget.bytes < bytes)
-        return Result::failure(
-            QStringLiteral("makes the parameters longer than %1 bytes").arg(kMaxParameterBytes));
-    --budget.parameters;
-    budget.bytes -= bytes;
-    return {};
-}
-
 /// The number of elements of an attribute, which has one dimension or none; -1 when it is otherwise or too long.
 qint64 countElements(hid_t attribute, Parameter::Kind kind, std::size_t elementSize)
 {
@@ -127,6 +115,18 @@ Result readMember(hid_t group, const QByteArray& name, ParameterBudget& budget, 
 }
 
 }  // namespace
+
+Result spend(ParameterBudget& budget, qint64 bytes)
+{
+    if (budget.parameters < 1)
+        return Result::failure(QStringLiteral("is one of more than %1 parameters").arg(kMaxParameters));
+    if (budget.bytes < bytes)
+        return Result::failure(
+            QStringLiteral("makes the parameters longer than %1 bytes").arg(kMaxParameterBytes));
+    --budget.parameters;
+    budget.bytes -= bytes;
+    return {};
+}
 
 Result readAttribute(hid_t object, const QByteArray& name, ParameterBudget& budget, Parameter& parameter)
 {

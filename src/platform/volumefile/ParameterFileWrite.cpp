@@ -54,10 +54,9 @@ Result writeParameter(hid_t group, const QByteArray& name, ParameterBudget& budg
         return Result::failure(QStringLiteral("is no name of a parameter"));
     if (parameter.kind == Parameter::Kind::Text && parameter.text.contains('\0'))
         return Result::failure(QStringLiteral("has a zero in its text"));
-    if (budget.parameters < 1 || budget.bytes < size)
-        return Result::failure(QStringLiteral("is more than a file can hold"));
-    --budget.parameters;
-    budget.bytes -= size;
+    const Result spent = spend(budget, size);
+    if (spent.bad())
+        return spent;
     if (size > kMaxAttributeBytes)
         return writeDataset(group, name, parameter.kind, bytesOf(parameter));
     return writeAttribute(group, name, parameter);

@@ -1,5 +1,7 @@
 #include "platform/volumefile/PartFile.h"
 
+#include "platform/base/SystemFailure.h"
+
 #include <QRandomGenerator>
 
 #include <fcntl.h>
@@ -9,21 +11,10 @@
 #include <cerrno>
 #include <cstdio>
 #include <cstring>
-#include <system_error>
 #include <utility>
 
 namespace Kdd::VolumeFile
 {
-namespace
-{
-
-Result systemFailure(const char* what, int error)
-{
-    const QString reason = QString::fromLocal8Bit(std::system_category().message(error).c_str());
-    return Result::failure(reason).within(QString::fromLatin1(what));
-}
-
-}  // namespace
 
 PartFile::~PartFile()
 {
@@ -39,7 +30,7 @@ Result PartFile::create(const QByteArray& target)
     const QByteArray path = target + '.' + passing + ".part";
     mDescriptor = ::open(path.constData(), O_RDWR | O_CREAT | O_EXCL | O_CLOEXEC, 0666);
     if (mDescriptor < 0)
-        return systemFailure("cannot be made", errno);
+        return systemFailure(errno).within(QStringLiteral("cannot be made"));
     mTarget = target;
     mPath = path;
     return {};
@@ -99,7 +90,7 @@ bool PartFile::read(qint64 at, void* bytes, std::size_t size)
 
 Result PartFile::state() const
 {
-    return mError == 0 ? Result() : systemFailure("cannot be written", mError);
+    return mError == 0 ? Result() : systemFailure(mError).within(QStringLiteral("cannot be written"));
 }
 
 Result PartFile::publish()
@@ -112,7 +103,7 @@ Result PartFile::publish()
     if (mError != 0)
         return state();
     if (std::rename(mPath.constData(), mTarget.constData()) != 0)
-        return systemFailure("cannot be named", errno);
+        return systemFailure(errno).within(QStringLiteral("cannot be named"));
     mPath.clear();
     return {};
 }

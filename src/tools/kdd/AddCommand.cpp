@@ -81,9 +81,12 @@ Outcome runAdd(const GlobalOptions& options, const ScanRequest& request)
     scan.setNamesSkipped(options.verbose);
     scan.setDamage(request.tolerant ? Damage::Tolerated : Damage::Refused);
     StudyIntake intake(*database, progress);
-    const bool isDone =
-        scan.run(request.paths, [&](DicomInput input) { return intake.take(std::move(input)); }) &&
-        intake.finish() && (scan.unchanged() == 0 || intake.completeWaiting(request.paths));
+    Result taken = scan.run(request.paths, [&](DicomInput input) { return intake.take(std::move(input)); });
+    if (taken.good())
+        taken = intake.finish();
+    if (taken.good() && scan.unchanged() > 0)
+        taken = intake.completeWaiting(request.paths);
+    const bool isDone = succeeded(taken);
     report(options, scan, intake);
     const QByteArray finished = QByteArray::number(intake.studies().size()) + " studies are complete";
     const bool isWhole =

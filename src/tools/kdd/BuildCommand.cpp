@@ -39,7 +39,7 @@ Outcome runBuild(const GlobalOptions& options, const BuildRequest& request)
     int expected = 0;
     if (database == nullptr || !chooseStudies(*database, request.selection.studies, false, named) ||
         (request.settle && !succeeded(database->settleNow())) ||
-        (request.selection.all && !requestStale(*database, request.again)) ||
+        (request.selection.all && !succeeded(requestStale(*database, request.again))) ||
         !succeeded(database->countWaiting(expected)))
         return Outcome::Failed;
     CommandProgress progress("Building", !options.quiet);

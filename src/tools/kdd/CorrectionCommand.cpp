@@ -1,4 +1,5 @@
 #include "kddlib/Limits.h"
+#include "kddlib/archive/ArchiveDatabase.h"
 #include "kddlib/archive/StudyChange.h"
 #include "kddlib/tagfile/QAData.h"
 #include "kddlib/tagfile/TagFile.h"
@@ -78,15 +79,6 @@ bool resolveStudies(const CorrectionRequest& request, QAData& job)
     return false;
 }
 
-bool apply(QAData& job)
-{
-    QString message;
-    const bool isDone = StudyChange::correct(job, message);
-    if (!isDone)
-        LogFile::errorf("The correction is not made: %s", qUtf8Printable(message));
-    return isDone;
-}
-
 void report(const GlobalOptions& options, const QAData& job)
 {
     const QAData::Outcome& outcome = job.outcome;
@@ -116,7 +108,7 @@ Outcome runCorrection(const GlobalOptions& options, const CorrectionRequest& req
     QAData job;
     if (!readJob(request, job) || !readImages(request, job) || !resolveStudies(request, job))
         return Outcome::Failed;
-    if (!apply(job))
+    if (!succeeded(StudyChange::correct(job).within(QStringLiteral("The correction is not made"))))
         return Outcome::Failed;
     report(options, job);
     return job.outcome.notFound.isEmpty() ? Outcome::Done : Outcome::Failed;

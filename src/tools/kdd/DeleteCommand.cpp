@@ -12,7 +12,7 @@ Outcome runDelete(const GlobalOptions& options, const NodeSelection& selection)
     QByteArray studyUID;
     const std::unique_ptr<Kxg::Catalogue> database = openExistingDatabase();
     if (database == nullptr || !resolveStudy(*database, selection.study, studyUID) ||
-        !StudyChange(*database).remove({studyUID, selection.series, selection.image}))
+        !succeeded(StudyChange(*database).remove({studyUID, selection.series, selection.image})))
         return Outcome::Failed;
     if (options.json)
         printJson({{QStringLiteral("deleted"), 1}});

@@ -23,9 +23,11 @@ Outcome runIndex(const GlobalOptions& options, const ScanRequest& request)
     scan.setNamesSkipped(options.verbose);
     scan.setDamage(request.tolerant ? Damage::Tolerated : Damage::Refused);
     Registration registration(*database);
-    const bool isDone = scan.run(request.paths, [&](const DicomInput& input) {
-        return registration.add(input);
-    }) && registration.flush();
+    Result registered =
+        scan.run(request.paths, [&](const DicomInput& input) { return registration.add(input); });
+    if (registered.good())
+        registered = registration.flush();
+    const bool isDone = succeeded(registered);
     const int studies = registration.studies().size();
     const int failed = static_cast<int>(scan.refused().size());
     if (options.json) {

@@ -19,9 +19,9 @@ Outcome runSample(const GlobalOptions& options, const SampleRequest& request)
                                      [&](int done, int total) { progress.show(done, total); });
     }
     int volumes = 0;
-    const Result result = summary.failure.isEmpty()
-                              ? writeSampleVolumes(request.folder, volumes, summary.bytes)
-                              : Result::failure(summary.failure);
+    Result result = summary.result;
+    if (result.good())
+        result = writeSampleVolumes(request.folder, volumes, summary.bytes);
     if (!succeeded(result))
         return Outcome::Failed;
     if (options.json) {

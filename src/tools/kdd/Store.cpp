@@ -15,12 +15,6 @@ namespace Kdd
 namespace
 {
 
-bool isThere(const QString& path)
-{
-    FileStatus status;
-    return statusOf(pathBytes(path).constData(), status);
-}
-
 /// Of the studies that a beginning fits so many are named.
 constexpr int kNamesToTell = 3;
 
@@ -28,7 +22,7 @@ constexpr int kNamesToTell = 3;
 
 bool resolveStudy(const QByteArray& text, QByteArray& studyUID)
 {
-    if (isThere(TagFile::cacheFilePathForStudy(text.constData()))) {
+    if (presenceOf(TagFile::cacheFilePathForStudy(text.constData())) != FilePresence::Absent) {
         studyUID = text;
         return true;
     }
@@ -65,8 +59,7 @@ bool readStudyFile(const QByteArray& studyUID, TagFile& file)
     if (file.readWhenFreeForStudy(studyUID.constData(), false))
         return true;
     const QString path = TagFile::cacheFilePathForStudy(studyUID.constData());
-    FileStatus status;
-    const bool isEmpty = statusOf(pathBytes(path).constData(), status) && status.size == 0;
+    const bool isEmpty = presenceOf(path) == FilePresence::Empty;
     const QString reason = isEmpty ? QStringLiteral("it is empty") : file.failure();
     LogFile::errorf("Study %s cannot be read from %s: %s", studyUID.constData(), qUtf8Printable(path),
                     qUtf8Printable(reason));
@@ -77,7 +70,7 @@ bool readTagFile(const QString& path, TagFile& file)
 {
     if (file.readWhenFree(path, nullptr, false))
         return true;
-    if (!isThere(path) || file.wasLockedOut())
+    if (presenceOf(path) == FilePresence::Absent || file.wasLockedOut())
         LogFile::errorf("Could not open %s: %s", qUtf8Printable(path), qUtf8Printable(file.failure()));
     return false;
 }

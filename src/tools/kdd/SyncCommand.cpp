@@ -16,7 +16,7 @@ Outcome runSync(const GlobalOptions& options, const QByteArray& study)
     QByteArray studyUID;
     TagFile file;
     if (database == nullptr || !resolveStudy(*database, study, studyUID) ||
-        !StudyChange(*database).synchronise(studyUID, file))
+        !succeeded(StudyChange(*database).synchronise(studyUID, file)))
         return Outcome::Failed;
     const TagFile::Statistics statistics = file.statistics();
     if (options.json) {

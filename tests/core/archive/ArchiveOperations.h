@@ -129,10 +129,12 @@ protected:
         const QList<QByteArray> paths = {QByteArray::fromStdString(folder)};
         FileScan files(*mCatalogue, mObserver);
         StudyIntake intake(*mCatalogue, mObserver);
-        const bool isDone =
-            files.run(paths, [&](DicomInput input) { return intake.take(std::move(input)); }) &&
-            intake.finish() && (files.unchanged() == 0 || intake.completeWaiting(paths));
-        expect(isDone && files.refused().empty(), "the intake broke off");
+        Result result = files.run(paths, [&](DicomInput input) { return intake.take(std::move(input)); });
+        if (result.good())
+            result = intake.finish();
+        if (result.good() && files.unchanged() > 0)
+            result = intake.completeWaiting(paths);
+        expect(result.good() && files.refused().empty(), "the intake broke off");
         expectSame(intake.refused().empty(), mModel.add(folder), "add");
     }
 
@@ -141,10 +143,11 @@ protected:
         tell("index " + folder);
         Registration registration(*mCatalogue);
         FileScan files(*mCatalogue, mObserver);
-        const bool isDone = files.run({QByteArray::fromStdString(folder)}, [&](const DicomInput& input) {
-            return registration.add(input);
-        }) && registration.flush();
-        expect(isDone && files.refused().empty(), "the registration broke off");
+        Result result = files.run({QByteArray::fromStdString(folder)},
+                                  [&](const DicomInput& input) { return registration.add(input); });
+        if (result.good())
+            result = registration.flush();
+        expect(result.good() && files.refused().empty(), "the registration broke off");
         mModel.index(folder);
     }
 
@@ -164,7 +167,7 @@ protected:
             if (mModel.isSettled(study))
                 settled[study] = bytesOf(study);
         }
-        expect(requestStale(*mCatalogue, again), "nothing could be requested");
+        expect(requestStale(*mCatalogue, again).good(), "nothing could be requested");
         expectSame(buildQueue(), mModel.buildAll(again), "build --all");
         for (const auto& study : settled)
             expect(bytesOf(study.first) == study.second,
@@ -192,14 +195,15 @@ protected:
         tell("delete study " + study + " series " + series + " image " + image);
         const ArchiveNode node = {QByteArray::fromStdString(study), QByteArray::fromStdString(series),
                                   QByteArray::fromStdString(image)};
-        expectSame(StudyChange(*mCatalogue).remove(node), mModel.remove(study, series, image), "delete");
+        expectSame(StudyChange(*mCatalogue).remove(node).good(), mModel.remove(study, series, image),
+                   "delete");
     }
 
     void sync(const std::string& study)
     {
         tell("sync " + study);
         TagFile file;
-        expectSame(StudyChange(*mCatalogue).synchronise(QByteArray::fromStdString(study), file),
+        expectSame(StudyChange(*mCatalogue).synchronise(QByteArray::fromStdString(study), file).good(),
                    mModel.sync(study), "sync");
     }
 
@@ -215,8 +219,8 @@ protected:
         job.substitutions = {{DCM_PatientName, QString::fromStdString(patient)}};
         job.timestamp = "20240131120000";
         job.login = "anna";
-        QString message;
-        expect(StudyChange::correct(job, message), "the correction is refused: " + message.toStdString());
+        const Result corrected = StudyChange::correct(job);
+        expect(corrected.good(), "the correction is refused: " + corrected.text().toStdString());
         const int found = mModel.edit(study, image, patient);
         expect(job.outcome.notFound.size() == 1 - found, "the correction finds another number of images");
     }

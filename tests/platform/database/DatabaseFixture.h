@@ -64,6 +64,12 @@ protected:
         EXPECT_EQ(catalogue().registerFiles(files, requests).text().toStdString(), "");
         return requests;
     }
+    Requests correct(const std::vector<Kxg::ImageCorrection>& corrections)
+    {
+        Requests requests;
+        EXPECT_EQ(catalogue().recordCorrections(corrections, requests).text().toStdString(), "");
+        return requests;
+    }
     Requests add(const std::vector<Kxg::DicomFileRecord>& files)
     {
         return add(Kxg::FileRecords{files, {}, {}});

@@ -78,4 +78,17 @@ TEST_P(MigrationTest, ADatabaseOfTheFirstReleaseKeepsAllThatItKnows)
     EXPECT_EQ(known.size(), 7);
 }
 
+TEST_P(MigrationTest, ADatabaseOfTheSecondSchemaKnowsWhichFilesACorrectionMoved)
+{
+    add({dicom("/d/a", "1", "1.1", "x"), dicom("/d/b", "1", "1.1", "")});
+    correct({{"1", "x", "2", "2.1", "y", "changes"}, {"1", "/d/b", "2", "2.1", "/d/b", "changes"}});
+    for (const char* backwards :
+         {"DROP INDEX file_of_correction", "ALTER TABLE file DROP COLUMN correction_id",
+          "UPDATE schema_version SET version = 2"})
+        execute(backwards);
+    open();  // and bring it up to date
+    correct({{"1", "x", "1", "1.1", "x", ""}, {"1", "/d/b", "1", "1.1", "/d/b", ""}});
+    EXPECT_EQ(studies(), "1   1/2/0*\n");
+}
+
 }  // namespace

@@ -52,6 +52,11 @@ PixelDataset window(const char* center, const char* width)
     return PixelDataset::item().with(DCM_WindowCenter, center).with(DCM_WindowWidth, width);
 }
 
+PixelDataset rampInWindow(const char* center, const char* width)
+{
+    return ramp().with(DCM_WindowCenter, center).with(DCM_WindowWidth, width);
+}
+
 struct RangeCase
 {
     const char* name;
@@ -62,12 +67,10 @@ struct RangeCase
 
 const RangeCase kRanges[] = {
     {"OfThePixels", ramp(), 0, 2000},
-    {"OfTheWindow", ramp().with(DCM_WindowCenter, "500").with(DCM_WindowWidth, "400"), 300, 700},
-    {"OfTheFirstUsableWindow", ramp().with(DCM_WindowCenter, "5\\500").with(DCM_WindowWidth, "0\\400"), 300,
-     700},
-    {"NotOfAWindowBesideThePixels", ramp().with(DCM_WindowCenter, "9000").with(DCM_WindowWidth, "400"), 0,
-     2000},
-    {"NotOfAWindowThatIsNoNumber", ramp().with(DCM_WindowCenter, "x").with(DCM_WindowWidth, "400"), 0, 2000},
+    {"OfTheWindow", rampInWindow("500", "400"), 300, 700},
+    {"OfTheFirstUsableWindow", rampInWindow("5\\500", "0\\400"), 300, 700},
+    {"NotOfAWindowBesideThePixels", rampInWindow("9000", "400"), 0, 2000},
+    {"NotOfAWindowThatIsNoNumber", rampInWindow("x", "400"), 0, 2000},
     {"Rescaled", ramp().with(DCM_RescaleSlope, "2").with(DCM_RescaleIntercept, "-1000"), -1000, 3000},
     {"RescaledDownwards", ramp().with(DCM_RescaleSlope, "-1").with(DCM_RescaleIntercept, "0"), -2000, 0},
     {"WithoutPadding", signedRamp().numbers(DCM_PixelPaddingValue, {0xf830}), -100, 1000},
@@ -107,12 +110,10 @@ TEST(KxVolumeInfo, TakesTheRangeFromWhereTheImageTellsIt)
     }
 }
 
-TEST(KxVolumeInfo, AppliesTablesAndRescaleToPixels)
+TEST(KxVolumeInfo, AppliesTablesToPixels)
 {
     const auto modality = ramp().withItem(DCM_ModalityLUTSequence, lookUp({3, 99, 16}, {7, 500, 900}));
     EXPECT_EQ(numbersOf(*show(modality)), (QVector<double>{7, 500, 900, 900}));
-    const auto rescaled = ramp().with(DCM_RescaleSlope, "2").with(DCM_RescaleIntercept, "-1000");
-    EXPECT_EQ(numbersOf(*show(rescaled)), (QVector<double>{-1000, -800, 1000, 3000}));
 }
 
 TEST(KxVolumeInfo, SpreadsARangeOfFewSteps)

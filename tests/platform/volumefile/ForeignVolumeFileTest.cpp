@@ -6,6 +6,7 @@
 #include <gtest/gtest.h>
 #include <hdf5.h>
 
+#include <functional>
 #include <random>
 
 using namespace Kdd;
@@ -62,7 +63,7 @@ TEST(DamagedVolumeFile, IsRefusedOrGivesTheTruePixels)
 {
     const QByteArray whole = smallFile();
     std::minstd_rand random(1);
-    for (int i = 0; i < 4'000; ++i) {
+    for (int i = 0; i < 1'500; ++i) {
         QByteArray damaged = whole;
         for (int flip = 0; flip <= i % 3; ++flip) {
             const int at = static_cast<int>(random() % static_cast<unsigned>(damaged.size()));
@@ -78,10 +79,12 @@ struct Hostile
 {
     const char* name;
     const char* reason;
-    void (*change)(hid_t file);
+    std::function<void(hid_t file)> change;
 };
 
-void putDataset(hid_t file, const char* name, hid_t type, const std::vector<hsize_t>& dims, hid_t properties)
+using Dims = std::vector<hsize_t>;
+
+void putDataset(hid_t file, const char* name, hid_t type, const Dims& dims, hid_t properties)
 {
     if (H5Lexists(file, name, H5P_DEFAULT) > 0)
         H5Ldelete(file, name, H5P_DEFAULT);
@@ -91,14 +94,14 @@ void putDataset(hid_t file, const char* name, hid_t type, const std::vector<hsiz
     H5Pclose(properties);
 }
 
-hid_t chunked(const std::vector<hsize_t>& chunk)
+hid_t chunked(const Dims& chunk)
 {
     const hid_t properties = H5Pcreate(H5P_DATASET_CREATE);
     H5Pset_chunk(properties, static_cast<int>(chunk.size()), chunk.data());
     return properties;
 }
 
-hid_t compressed(const std::vector<hsize_t>& chunk)
+hid_t compressed(const Dims& chunk)
 {
     const hid_t properties = chunked(chunk);
     H5Pset_deflate(properties, 1);
@@ -113,13 +116,6 @@ void putChunk(hid_t file, int size)
     const hid_t dataset = H5Dopen2(file, kLevel0, H5P_DEFAULT);
     H5Dwrite_chunk(dataset, H5P_DEFAULT, 0, start, static_cast<size_t>(stream.size()), stream.constData());
     H5Dclose(dataset);
-}
-
-hid_t externalStorage()
-{
-    const hid_t properties = H5Pcreate(H5P_DATASET_CREATE);
-    H5Pset_external(properties, "/etc/hostname", 0, 6);
-    return properties;
 }
 
 hid_t virtualStorage()
@@ -146,47 +142,41 @@ void putAttribute(hid_t file, const char* group, hid_t type, hsize_t count)
     H5Sclose(space);
 }
 
-void nest(hid_t file, int depth)
+/// Another lattice in place of the one that is there.
+std::function<void(hid_t)> pixels(hid_t type, const Dims& dims, const Dims& chunk)
 {
-    hid_t group = H5Gopen2(file, "Parameters", H5P_DEFAULT);
-    for (int i = 0; i < depth; ++i) {
-        const hid_t below = H5Gcreate2(group, "Below", H5P_DEFAULT, H5P_DEFAULT, H5P_DEFAULT);
-        H5Gclose(group);
-        group = below;
-    }
-    H5Gclose(group);
+    return [=](hid_t file) { putDataset(file, kLevel0, type, dims, compressed(chunk)); };
 }
+
+/// A dataset of one dimension.
+std::function<void(hid_t)> row(const char* name, hid_t type, hsize_t count, hsize_t chunk)
+{
+    return [=](hid_t file) { putDataset(file, name, type, {count}, compressed({chunk})); };
+}
+
+std::function<void(hid_t)> parameter(hid_t type, hsize_t count)
+{
+    return [=](hid_t file) { putAttribute(file, "Parameters", type, count); };
+}
+
+constexpr hsize_t kMany = 1 << 22;
 
 const Hostile kHostile[] = {
     {"ClaimsPixelsThatAreNotThere", "slice 0: is not in the file",
-     [](hid_t f) {
-         putDataset(f, kLevel0, H5T_STD_U16LE, {9, 20'000, 20'000}, compressed({1, 20'000, 20'000}));
-     }},
+     pixels(H5T_STD_U16LE, {9, 20'000, 20'000}, {1, 20'000, 20'000})},
     {"ChunkInflatesToAnotherLength", "slice 2: is damaged", [](hid_t f) { putChunk(f, 401); }},
-    {"ChunkInflatesWithoutEnd", "slice 2: is damaged", [](hid_t f) { putChunk(f, 200'000); }},
-    {"ChunkTooLarge", "chunks of more than",
+    {"ChunkTooLarge", "chunks of more than", pixels(H5T_STD_U16LE, {1, 40'000, 20'000}, {1, 40'000, 20'000})},
+    {"TooManySlices", "dimension 0 is 1099511627776", pixels(H5T_STD_U8LE, {1ULL << 40, 1, 1}, {1, 1, 1})},
+    {"NoSlices", "dimension 0 is 0", pixels(H5T_STD_U8LE, {0, 1, 1}, {1, 1, 1})},
+    {"ChunkIsNotASlice", "dimension 0 is 2 in chunks of 2", pixels(H5T_STD_U8LE, {2, 4, 4}, {2, 4, 4})},
+    {"BigEndian", "unknown type", pixels(H5T_STD_U16BE, {2, 4, 4}, {1, 4, 4})},
+    {"VariableTexts", "neither numbers nor characters",
      [](hid_t f) {
-         putDataset(f, kLevel0, H5T_STD_U16LE, {1, 40'000, 20'000}, compressed({1, 40'000, 20'000}));
-     }},
-    {"TooManySlices", "dimension 0 is 1099511627776",
-     [](hid_t f) {
-         putDataset(f, kLevel0, H5T_STD_U8LE, {1ULL << 40, 1, 1}, compressed({1, 1, 1}));
-     }},
-    {"NoSlices", "dimension 0 is 0",
-     [](hid_t f) {
-         putDataset(f, kLevel0, H5T_STD_U8LE, {0, 1, 1}, compressed({1, 1, 1}));
-     }},
-    {"ChunkIsNotASlice", "dimension 0 is 2 in chunks of 2",
-     [](hid_t f) {
-         putDataset(f, kLevel0, H5T_STD_U8LE, {2, 4, 4}, compressed({2, 4, 4}));
+         putDataset(f, kLevel0, variableText(), Dims{1, 2, 3}, compressed({1, 2, 3}));
      }},
     {"NotCompressed", "is not compressed",
      [](hid_t f) {
-         putDataset(f, kLevel0, H5T_STD_U8LE, {2, 4, 4}, chunked({1, 4, 4}));
-     }},
-    {"BigEndian", "unknown type",
-     [](hid_t f) {
-         putDataset(f, kLevel0, H5T_STD_U16BE, {2, 4, 4}, compressed({1, 4, 4}));
+         putDataset(f, kLevel0, H5T_STD_U8LE, Dims{2, 4, 4}, chunked({1, 4, 4}));
      }},
     {"OtherFilter", "has filter",
      [](hid_t f) {
@@ -194,40 +184,25 @@ const Hostile kHostile[] = {
          H5Pset_fletcher32(properties);
          putDataset(f, kLevel0, H5T_STD_U16LE, {2, 4, 4}, properties);
      }},
-    {"PixelsInAnotherFile", "not stored in chunks",
-     [](hid_t f) {
-         putDataset(f, kLevel0, H5T_STD_U8LE, {1, 2, 3}, externalStorage());
-     }},
     {"VirtualPixels", "not stored in chunks",
      [](hid_t f) {
-         putDataset(f, kLevel0, H5T_STD_U8LE, {1, 2, 3}, virtualStorage());
-     }},
-    {"VariableTexts", "neither numbers nor characters",
-     [](hid_t f) {
-         putDataset(f, kLevel0, variableText(), {1, 2, 3}, compressed({1, 2, 3}));
+         putDataset(f, kLevel0, H5T_STD_U8LE, Dims{1, 2, 3}, virtualStorage());
      }},
     {"GroupInPlaceOfALattice", "is no dataset",
      [](hid_t f) { H5Gclose(H5Gcreate2(f, "Lattices/Group", H5P_DEFAULT, H5P_DEFAULT, H5P_DEFAULT)); }},
     {"LinkToAnotherFile", "is a link to elsewhere",
      [](hid_t f) { H5Lcreate_external("o.vol", "/", f, "Parameters/Link", H5P_DEFAULT, H5P_DEFAULT); }},
-    {"SoftLink", "is a link to elsewhere",
-     [](hid_t f) { H5Lcreate_soft("/Parameters", f, "Parameters/Link", H5P_DEFAULT, H5P_DEFAULT); }},
     {"BundleInsideItself", "nested too deep",
      [](hid_t f) { H5Lcreate_hard(f, "Parameters", f, "Parameters/Self", H5P_DEFAULT, H5P_DEFAULT); }},
-    {"BundlesTooDeep", "nested too deep", [](hid_t f) { nest(f, 8); }},
     {"VariableTextAsParameter", "neither a fixed-length text",
      [](hid_t f) { putAttribute(f, "Parameters", variableText(), 1); }},
-    {"ParameterOfAnotherType", "neither a fixed-length text",
-     [](hid_t f) { putAttribute(f, "Parameters", H5T_STD_I32LE, 1); }},
-    {"ListOfTexts", "wrong shape", [](hid_t f) { putAttribute(f, "Parameters", H5T_C_S1, 3); }},
-    {"LongParameterInPieces", "not one chunk",
-     [](hid_t f) { putDataset(f, "Parameters/Long", H5T_STD_I64LE, {9}, compressed({3})); }},
+    {"ParameterOfAnotherType", "neither a fixed-length text", parameter(H5T_STD_I32LE, 1)},
+    {"ListOfTexts", "wrong shape", parameter(H5T_C_S1, 3)},
+    {"LongParameterInPieces", "not one chunk", row("Parameters/Long", H5T_STD_I64LE, 9, 3)},
     {"ParameterClaimsMoreThanThereIs", "is not in the file",
-     [](hid_t f) { putDataset(f, "Parameters/Long", H5T_STD_I64LE, {1 << 22}, compressed({1 << 22})); }},
-    {"TooManyCounts", "has 2097152 counts",
-     [](hid_t f) { putDataset(f, kHistogram, H5T_STD_U64LE, {1 << 21}, compressed({1 << 21})); }},
-    {"CountsOfAnotherType", "not one chunk of 64-bit counts",
-     [](hid_t f) { putDataset(f, kHistogram, H5T_STD_I64LE, {9}, compressed({9})); }},
+     row("Parameters/Long", H5T_STD_I64LE, kMany, kMany)},
+    {"TooManyCounts", "has 4194304 counts", row(kHistogram, H5T_STD_U64LE, kMany, kMany)},
+    {"CountsOfAnotherType", "not one chunk of 64-bit counts", row(kHistogram, H5T_STD_I64LE, 9, 9)},
     {"LaterVersion", "format version",
      [](hid_t f) {
          H5Arename(f, "FormatVersion", "FormerVersion");
@@ -281,9 +256,7 @@ TEST(ForeignVolumeFile, HasTheFiltersOfTheLibrary)
     H5Dclose(dataset);
     H5Fclose(file);
 
-    Result result;
-    const auto mesh = OrlanMesh::read(builder.path(), result);
-    ASSERT_TRUE(mesh) << qPrintable(result.text());
+    const auto mesh = builder.open();
     QByteArray found;
     for (int i = 0; i < 3; ++i) {
         TypedData2D pixels;

@@ -4,9 +4,20 @@
 #include <QFile>
 
 #include <random>
+#include <stdexcept>
 
 namespace Kdd
 {
+
+namespace
+{
+
+std::unique_ptr<OrlanMesh> required(std::unique_ptr<OrlanMesh> mesh, const Result& result)
+{
+    return mesh != nullptr ? std::move(mesh) : throw std::runtime_error(result.text().toStdString());
+}
+
+}  // namespace
 
 Lattice aLattice(PrimitiveType type, int components, int slices)
 {
@@ -47,11 +58,16 @@ QByteArray VolumeFileBuilder::bytes() const
     return file.open(QIODevice::ReadOnly) ? file.readAll() : QByteArray();
 }
 
-void VolumeFileBuilder::replace(const QByteArray& bytes) const
+std::unique_ptr<OrlanMesh> VolumeFileBuilder::open() const
 {
-    QFile file(QFile::decodeName(path()));
-    if (file.open(QIODevice::WriteOnly | QIODevice::Truncate))
-        file.write(bytes);
+    Result result;
+    return required(OrlanMesh::read(path(), result), result);
+}
+
+std::unique_ptr<OrlanMesh> VolumeFileBuilder::openInMemory() const
+{
+    Result result;
+    return required(OrlanMesh::read(bytes(), "memory", result), result);
 }
 
 }  // namespace Kdd

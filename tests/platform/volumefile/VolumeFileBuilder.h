@@ -26,7 +26,10 @@ public:
     Result write(const Lattice& lattice, const ParamBundle& parameters = {}) const;
 
     QByteArray bytes() const;
-    void replace(const QByteArray& bytes) const;
+
+    /// What was written, from its file or from its bytes; a test that cannot have it fails by an exception.
+    std::unique_ptr<OrlanMesh> open() const;
+    std::unique_ptr<OrlanMesh> openInMemory() const;
 
 private:
     QTemporaryDir mFolder;

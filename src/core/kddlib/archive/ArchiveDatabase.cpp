@@ -29,12 +29,14 @@ bool succeeded(const Result& result)
     return result.good();
 }
 
-std::unique_ptr<Kxg::StudyClaim> claimStudy(Kxg::Catalogue& catalogue, const QByteArray& studyUID)
+Result claimStudy(Kxg::Catalogue& catalogue, const QByteArray& studyUID,
+                  std::unique_ptr<Kxg::StudyClaim>& claim)
 {
-    std::unique_ptr<Kxg::StudyClaim> claim;
-    if (succeeded(catalogue.claim(studyUID, kPatience, claim)) && claim == nullptr)
-        LogFile::errorf("Study %s is being worked on by another process", studyUID.constData());
-    return claim;
+    Result result = catalogue.claim(studyUID, kPatience, claim);
+    if (result.good() && claim == nullptr)
+        result = Result::failure(QStringLiteral("Study %1 is being worked on by another process")
+                                     .arg(QString::fromUtf8(studyUID)));
+    return result;
 }
 
 }  // namespace Kdd

@@ -5,6 +5,7 @@
 #include "kddlib/net/dicom/DicomFileReader.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/VolumeInfo.h"
+#include "platform/base/SystemFailure.h"
 #include "platform/os/FileStatus.h"
 #include "platform/os/RandomAccessFile.h"
 #include "platform/volumefile/OrlanMesh.h"
@@ -21,11 +22,6 @@ namespace
 {
 
 constexpr int kPreamble = 128;
-
-QString errnoText(int error)
-{
-    return QString::fromLocal8Bit(std::strerror(error));
-}
 
 DicomInput& refuse(DicomInput& input, DicomInput::Kind kind, const QString& reason)
 {
@@ -155,7 +151,7 @@ DicomInput readDicomInput(const QByteArray& path, Damage damage)
         return std::move(refuse(input, DicomInput::Kind::Unusable, QStringLiteral("Its path is too long")));
     RandomAccessFile file;
     if (const int error = file.open(path.constData()))
-        return std::move(refuse(input, DicomInput::Kind::Unusable, errnoText(error)));
+        return std::move(refuse(input, DicomInput::Kind::Unusable, systemFailure(error).text()));
     input.fileBytes = file.size();
     if (input.fileBytes == 0)
         return std::move(refuse(input, DicomInput::Kind::Unusable, QStringLiteral("The file is empty")));

@@ -1,6 +1,5 @@
 #include "kddlib/archive/FileScan.h"
 
-#include "kddlib/archive/ArchiveDatabase.h"
 #include "kddlib/archive/FileWalk.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
@@ -32,14 +31,15 @@ std::vector<DicomInput> readSome(const QList<QByteArray>& paths, Damage damage)
 
 }  // namespace
 
-bool FileScan::run(const QList<QByteArray>& paths, const std::function<bool(DicomInput)>& take)
+Result FileScan::run(const QList<QByteArray>& paths, const std::function<Result(DicomInput)>& take)
 {
     QList<QByteArray> files;
-    return findChanged(paths, files) && readAll(files, take);
+    Result found = findChanged(paths, files);
+    return found.good() ? readAll(files, take) : found;
 }
 
 /// Reads the files on as many threads as there are cores and hands them on in their order.
-bool FileScan::readAll(const QList<QByteArray>& files, const std::function<bool(DicomInput)>& take)
+Result FileScan::readAll(const QList<QByteArray>& files, const std::function<Result(DicomInput)>& take)
 {
     const unsigned ahead = qMax(1U, std::thread::hardware_concurrency());
     std::deque<std::future<std::vector<DicomInput>>> running;
@@ -51,19 +51,21 @@ bool FileScan::readAll(const QList<QByteArray>& files, const std::function<bool(
                 std::async(std::launch::async, readSome, files.mid(next, kFilesPerTask), mDamage));
             next += kFilesPerTask;
         }
+        // Handed on in their order, whichever is read first: of several files of one image the last counts.
         for (DicomInput& input : running.front().get()) {
             if (mObserver.isCancelled())
-                return true;
-            if (!handOn(std::move(input), take))
-                return false;
+                return {};
+            Result taken = handOn(std::move(input), take);
+            if (taken.bad())
+                return taken;
             mObserver.progress(++done, files.size());
         }
         running.pop_front();
     }
-    return true;
+    return {};
 }
 
-bool FileScan::findChanged(const QList<QByteArray>& paths, QList<QByteArray>& changed)
+Result FileScan::findChanged(const QList<QByteArray>& paths, QList<QByteArray>& changed)
 {
     for (const QByteArray& path : paths) {
         QStringList faults;
@@ -73,8 +75,9 @@ bool FileScan::findChanged(const QList<QByteArray>& paths, QList<QByteArray>& ch
             mRefused.push_back({path, fault});
         }
         QHash<QByteArray, Kxg::FileStamp> known;
-        if (!succeeded(mCatalogue.knownFiles(absolutePath(path), known)))
-            return false;
+        Result asked = mCatalogue.knownFiles(absolutePath(path), known);
+        if (asked.bad())
+            return asked;
         for (const QByteArray& file : files) {
             if (isOwn(file))
                 continue;
@@ -87,7 +90,7 @@ bool FileScan::findChanged(const QList<QByteArray>& paths, QList<QByteArray>& ch
                 changed.append(file);
         }
     }
-    return true;
+    return {};
 }
 
 bool FileScan::isOwn(const QByteArray& file) const
@@ -97,7 +100,7 @@ bool FileScan::isOwn(const QByteArray& file) const
     });
 }
 
-bool FileScan::handOn(DicomInput input, const std::function<bool(DicomInput)>& take)
+Result FileScan::handOn(DicomInput input, const std::function<Result(DicomInput)>& take)
 {
     switch (input.kind) {
     case DicomInput::Kind::Image:
@@ -115,7 +118,7 @@ bool FileScan::handOn(DicomInput input, const std::function<bool(DicomInput)>& t
     case DicomInput::Kind::Unusable:
         LogFile::errorf("Could not take %s: %s", input.path.constData(), qUtf8Printable(input.reason));
         mRefused.push_back({input.path, input.reason});
-        return true;
+        return {};
     }
     return take(std::move(input));
 }

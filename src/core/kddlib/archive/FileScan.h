@@ -34,19 +34,19 @@ public:
     void setNamesSkipped(bool names) { mNamesSkipped = names; }
 
     /// Reads the files at and below the paths, several at a time, and hands on what each one is in their order until
-    /// `take` returns false or the observer cancels. Files that cannot be read are logged and refused instead. False
-    /// when the database failed or `take` ended it.
-    bool run(const QList<QByteArray>& paths, const std::function<bool(DicomInput)>& take);
+    /// `take` fails or the observer cancels. Files that cannot be read are logged and refused instead. Failure: that of
+    /// the database or of `take`.
+    Result run(const QList<QByteArray>& paths, const std::function<Result(DicomInput)>& take);
 
     int unchanged() const { return mUnchanged; }
     int skipped() const { return mSkipped; }
     const std::vector<RefusedFile>& refused() const { return mRefused; }
 
 private:
-    bool findChanged(const QList<QByteArray>& paths, QList<QByteArray>& changed);
+    Result findChanged(const QList<QByteArray>& paths, QList<QByteArray>& changed);
     bool isOwn(const QByteArray& file) const;
-    bool readAll(const QList<QByteArray>& files, const std::function<bool(DicomInput)>& take);
-    bool handOn(DicomInput input, const std::function<bool(DicomInput)>& take);
+    Result readAll(const QList<QByteArray>& files, const std::function<Result(DicomInput)>& take);
+    Result handOn(DicomInput input, const std::function<Result(DicomInput)>& take);
 
     Kxg::Catalogue& mCatalogue;
     WorkObserver& mObserver;

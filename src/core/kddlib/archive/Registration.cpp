@@ -1,6 +1,5 @@
 #include "kddlib/archive/Registration.h"
 
-#include "kddlib/archive/ArchiveDatabase.h"
 #include "kddlib/archive/DicomInput.h"
 #include "kddlib/tagfile/StudyRecord.h"
 #include "kddlib/tagmodel/TagMap.h"
@@ -37,7 +36,7 @@ void warnOf(const Kxg::FileConflict& conflict)
 
 }  // namespace
 
-bool Registration::add(const DicomInput& input)
+Result Registration::add(const DicomInput& input)
 {
     switch (input.kind) {
     case DicomInput::Kind::Image:
@@ -52,18 +51,20 @@ bool Registration::add(const DicomInput& input)
         break;
     case DicomInput::Kind::Unusable:
         // It is read again the next time, when it may have been mended.
-        return true;
+        return {};
     }
-    return mBatch.dicom.size() + mBatch.volumes.size() + mBatch.others.size() < kBatch || flush();
+    const auto files = mBatch.dicom.size() + mBatch.volumes.size() + mBatch.others.size();
+    return files < kBatch ? Result() : flush();
 }
 
-bool Registration::flush()
+Result Registration::flush()
 {
     if (mBatch.dicom.empty() && mBatch.volumes.empty() && mBatch.others.empty())
-        return true;
+        return {};
     Kxg::RegistrationOutcome outcome;
-    if (!succeeded(mCatalogue.registerFiles(mBatch, outcome)))
-        return false;
+    Result registered = mCatalogue.registerFiles(mBatch, outcome);
+    if (registered.bad())
+        return registered;
     for (auto it = outcome.requests.cbegin(); it != outcome.requests.cend(); ++it)
         mRequests[it.key()].append(it.value());
     for (const Kxg::FileConflict& conflict : outcome.conflicts)
@@ -71,7 +72,7 @@ bool Registration::flush()
     mImages += static_cast<int>(mBatch.dicom.size());
     mVolumes += static_cast<int>(mBatch.volumes.size());
     mBatch = {};
-    return true;
+    return {};
 }
 
 }  // namespace Kdd

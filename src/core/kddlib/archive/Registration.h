@@ -19,11 +19,11 @@ public:
     {
     }
 
-    /// False when the database failed, which is logged.
-    bool add(const DicomInput& input);
+    /// Registers, when there are enough for a batch, this one and those before it. Failure: that of the database.
+    Result add(const DicomInput& input);
 
     /// Registers what is still waiting for a full batch.
-    bool flush();
+    Result flush();
 
     /// The studies that registered files belong to or were taken from.
     QList<QByteArray> studies() const { return mRequests.keys(); }

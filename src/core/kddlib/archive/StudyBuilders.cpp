@@ -49,6 +49,7 @@ void StudyBuilders::workOnQueue(Kxg::Catalogue& catalogue)
             fail();
             return;
         }
+        // Others may still hold what waits; they will build it or leave it to the next run.
         if (claim == nullptr)
             return;
         build(catalogue, *claim);
@@ -58,8 +59,8 @@ void StudyBuilders::workOnQueue(Kxg::Catalogue& catalogue)
 void StudyBuilders::workOnNamed(Kxg::Catalogue& catalogue, const QVector<QByteArray>& studyUIDs)
 {
     for (int i = next(); i < studyUIDs.size() && !isCancelled(); i = next()) {
-        const std::unique_ptr<Kxg::StudyClaim> claim = claimStudy(catalogue, studyUIDs.at(i));
-        if (claim != nullptr)
+        std::unique_ptr<Kxg::StudyClaim> claim;
+        if (succeeded(claimStudy(catalogue, studyUIDs.at(i), claim)))
             build(catalogue, *claim);
         else
             fail();
@@ -69,8 +70,9 @@ void StudyBuilders::workOnNamed(Kxg::Catalogue& catalogue, const QVector<QByteAr
 void StudyBuilders::build(Kxg::Catalogue& catalogue, Kxg::StudyClaim& claim)
 {
     const CompletedStudy completed = StudyCompletion(catalogue, mOptimize).build(claim);
+    const bool isDone = succeeded(completed.result);
     const std::lock_guard<std::mutex> lock(mMutex);
-    if (completed.isDone) {
+    if (isDone) {
         mTotals.studies += completed.isRemoved ? 0 : 1;
         mTotals.images += completed.statistics.images;
         mTotals.volumes += completed.statistics.volumes;
@@ -106,11 +108,12 @@ QSet<int> StudyBuilders::failedStudies()
     return mFailedStudies;
 }
 
-bool requestStale(Kxg::Catalogue& catalogue, bool everything)
+Result requestStale(Kxg::Catalogue& catalogue, bool everything)
 {
     std::vector<Kxg::StudySummary> studies;
-    if (!succeeded(catalogue.listStudies(studies)))
-        return false;
+    Result listed = catalogue.listStudies(studies);
+    if (listed.bad())
+        return listed;
     QVector<QByteArray> stale;
     for (const Kxg::StudySummary& study : studies) {
         const QString path = TagFile::cacheFilePathForStudy(study.studyInstanceUID.constData());
@@ -118,7 +121,7 @@ bool requestStale(Kxg::Catalogue& catalogue, bool everything)
             stale.append(study.studyInstanceUID);
     }
     // Others may remove studies meanwhile.
-    return stale.isEmpty() || succeeded(catalogue.requestBuild(stale, Kxg::Catalogue::IfGone::PassOver));
+    return stale.isEmpty() ? Result() : catalogue.requestBuild(stale, Kxg::Catalogue::IfGone::PassOver);
 }
 
 }  // namespace Kdd

@@ -2,6 +2,7 @@
 
 #include "kddlib/archive/WorkObserver.h"
 #include "platform/base/Export.h"
+#include "platform/base/Result.h"
 
 #include <QByteArray>
 #include <QSet>
@@ -69,7 +70,7 @@ private:
 };
 
 /// Puts into the queue what has no tag file, a damaged one or one that is not what the catalogue believes it to be, as
-/// after the restoring of a backup; with `everything` all studies. False when the database failed, which is logged.
-KDD_EXPORT bool requestStale(Kxg::Catalogue& catalogue, bool everything);
+/// after the restoring of a backup; with `everything` all studies. Failure: that of the database.
+KDD_EXPORT Result requestStale(Kxg::Catalogue& catalogue, bool everything);
 
 }  // namespace Kdd

@@ -8,7 +8,6 @@
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
 #include "platform/os/FileStatus.h"
-#include "platform/os/PathName.h"
 
 #include <algorithm>
 
@@ -51,106 +50,115 @@ void takeOut(const ArchiveNode& node, TagFile& file)
         file.clear();
 }
 
-bool failAbsent(const ArchiveNode& node)
+Result absent(const ArchiveNode& node)
 {
+    const QString study = QString::fromUtf8(node.study);
     if (node.series.isEmpty() && node.image.isEmpty())
-        LogFile::errorf("There is no study %s", node.study.constData());
-    else
-        LogFile::errorf("Study %s has no %s %s", node.study.constData(),
-                        node.image.isEmpty() ? "series" : "image",
-                        (node.image.isEmpty() ? node.series : node.image).constData());
-    return false;
+        return Result::failure(QStringLiteral("There is no study %1").arg(study));
+    const bool isSeries = node.image.isEmpty();
+    return Result::failure(QStringLiteral("Study %1 has no %2 %3")
+                               .arg(study, isSeries ? QStringLiteral("series") : QStringLiteral("image"),
+                                    QString::fromUtf8(isSeries ? node.series : node.image)));
 }
 
-bool failChanging(const QByteArray& studyUID, const TagFile& file)
+Result unchanged(const QByteArray& studyUID, const TagFile& file)
 {
-    LogFile::errorf("Study %s is not changed: %s", studyUID.constData(), qUtf8Printable(file.failure()));
-    return false;
+    const QString what = QStringLiteral("Study %1 is not changed").arg(QString::fromUtf8(studyUID));
+    return file.failure().isEmpty() ? Result::failure(what) : Result::failure(file.failure()).within(what);
 }
 
 /// From a tag file that the catalogue does not know.
-bool removeUnregistered(const ArchiveNode& node)
+Result removeUnregistered(const ArchiveNode& node)
 {
     TagFile file;
-    FileStatus status;
-    const QString path = TagFile::cacheFilePathForStudy(node.study.constData());
-    if (!statusOf(pathBytes(path).constData(), status))
-        return failAbsent(node);
+    if (presenceOf(TagFile::cacheFilePathForStudy(node.study.constData())) == FilePresence::Absent)
+        return absent(node);
     if (!file.readWhenFreeForStudy(node.study.constData(), true))
-        return failChanging(node.study, file);
+        return unchanged(node.study, file);
     if (!isHeld(node, file))
-        return failAbsent(node);
+        return absent(node);
     takeOut(node, file);
-    return file.writeCacheFile() || failChanging(node.study, file);
+    return file.writeCacheFile() ? Result() : unchanged(node.study, file);
 }
 
 }  // namespace
 
-bool StudyChange::remove(const ArchiveNode& node)
+Result StudyChange::remove(const ArchiveNode& node)
 {
     QVector<QByteArray> registered;
-    if (!succeeded(mCatalogue.findStudies(node.study, 1, registered)))
-        return false;
+    Result found = mCatalogue.findStudies(node.study, 1, registered);
+    if (found.bad())
+        return found;
     return registered.contains(node.study) ? removeRegistered(node) : removeUnregistered(node);
 }
 
-bool StudyChange::removeRegistered(const ArchiveNode& node)
+Result StudyChange::removeRegistered(const ArchiveNode& node)
 {
-    const std::unique_ptr<Kxg::StudyClaim> claim = claimStudy(mCatalogue, node.study);
+    std::unique_ptr<Kxg::StudyClaim> claim;
     Kxg::StudyContents contents;
-    if (claim == nullptr || !succeeded(mCatalogue.studyContents(node.study, contents)))
-        return false;
+    Result result = claimStudy(mCatalogue, node.study, claim);
+    if (result.good())
+        result = mCatalogue.studyContents(node.study, contents);
+    if (result.bad())
+        return result;
     // What a removal that died has left in the tag file goes with its repeat.
     TagFile present;
     const bool isWholeStudy = node.series.isEmpty() && node.image.isEmpty();
     if (!isWholeStudy && !isListed(node, contents) &&
         !(present.readWhenFreeForStudy(node.study.constData(), false) && isHeld(node, present)))
-        return failAbsent(node);
-    if (!forget(node))
-        return false;
+        return absent(node);
+    result = forget(node);
+    if (result.bad())
+        return result;
     StudyCompletion completion(mCatalogue);
-    return (contents.changes.isEmpty() ? completion.reduce(*claim) : completion.build(*claim)).isDone;
+    return (contents.changes.isEmpty() ? completion.reduce(*claim) : completion.build(*claim)).result;
 }
 
-bool StudyChange::forget(const ArchiveNode& node)
+Result StudyChange::forget(const ArchiveNode& node)
 {
     if (!node.image.isEmpty())
-        return succeeded(mCatalogue.removeImage(node.study, node.image));
+        return mCatalogue.removeImage(node.study, node.image);
     if (!node.series.isEmpty())
-        return succeeded(mCatalogue.removeSeries(node.study, node.series));
-    return succeeded(mCatalogue.removeStudy(node.study));
+        return mCatalogue.removeSeries(node.study, node.series);
+    return mCatalogue.removeStudy(node.study);
 }
 
-bool StudyChange::correct(QAData& job, QString& message)
+Result StudyChange::correct(QAData& job)
 {
-    bool isDone = TagFile::applyQA(job, message);
+    QString reason;
+    bool isDone = TagFile::applyQA(job, reason);
     for (int i = 1; i < kAttempts && !isDone && job.outcome.isLockedOut; ++i)
-        isDone = TagFile::applyQA(job, message);
-    return isDone;
+        isDone = TagFile::applyQA(job, reason);
+    return isDone ? Result() : Result::failure(reason);
 }
 
-bool StudyChange::synchronise(const QByteArray& studyUID, TagFile& file)
+Result StudyChange::synchronise(const QByteArray& studyUID, TagFile& file)
 {
-    const std::unique_ptr<Kxg::StudyClaim> claim = claimStudy(mCatalogue, studyUID);
+    std::unique_ptr<Kxg::StudyClaim> claim;
     Kxg::StudyContents contents;
-    if (claim == nullptr || !succeeded(mCatalogue.studyContents(studyUID, contents)))
-        return false;
+    Result result = claimStudy(mCatalogue, studyUID, claim);
+    if (result.good())
+        result = mCatalogue.studyContents(studyUID, contents);
+    if (result.bad())
+        return result;
     const bool isStale = !isTagFile(TagFile::cacheFilePathForStudy(studyUID.constData()), contents.tagFile);
     if (!file.readAndSync(studyUID.constData(), nullptr))
-        return false;
+        return unchanged(studyUID, file);
     // What it shows may be older than what is registered, and would be taken for the newest once it is written.
-    if (isStale && !succeeded(mCatalogue.requestBuild({studyUID})))
-        return false;
+    if (isStale)
+        result = mCatalogue.requestBuild({studyUID});
+    if (result.bad())
+        return result;
     file.optimizeAll();
     if (!file.writeCacheFile())
-        return failChanging(studyUID, file);
+        return unchanged(studyUID, file);
     Kxg::BuiltStudy built = builtStudy(file);
     // Files that wait to be built in are not opened here.
     built.isComplete = false;
     if (isStale)
         LogFile::warnf("The tag file of study %s was not the one written last; the study waits to be built",
                        studyUID.constData());
-    return succeeded(claim->finish(built));
+    return claim->finish(built);
 }
 
 }  // namespace Kdd

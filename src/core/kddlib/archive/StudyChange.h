@@ -1,9 +1,10 @@
 #pragma once
 
 #include "platform/base/Export.h"
+#include "platform/base/Result.h"
 #include "platform/database/Catalogue.h"
 
-#include <QString>
+#include <QByteArray>
 
 namespace Kdd
 {
@@ -32,20 +33,19 @@ public:
 
     /// Removes a node for good; its files stay where they are, and come back only when they are taken in again. The
     /// catalogue forgets it first, so that a process that dies in between leaves a study that waits to be completed, and
-    /// a repeat completes it. False when there is no such node or when it is not removed; the reason is logged.
-    bool remove(const ArchiveNode& node);
+    /// a repeat completes it. Failure: there is no such node, or it is not removed.
+    Result remove(const ArchiveNode& node);
 
-    /// Applies a correction, trying again for some minutes while others hold the tag files. False, with the reason in
-    /// `message`, as `TagFile::applyQA`.
-    static bool correct(QAData& job, QString& message);
+    /// Applies a correction, trying again for some minutes while others hold the tag files.
+    static Result correct(QAData& job);
 
     /// Brings the tag file into line with the database without opening files: paths, names of volumes, what is not
-    /// listed any more. `file` holds the study afterwards. False when it cannot be read or written, which is logged.
-    bool synchronise(const QByteArray& studyUID, TagFile& file);
+    /// listed any more. `file` holds the study afterwards. Failure: it cannot be read or written.
+    Result synchronise(const QByteArray& studyUID, TagFile& file);
 
 private:
-    bool removeRegistered(const ArchiveNode& node);
-    bool forget(const ArchiveNode& node);
+    Result removeRegistered(const ArchiveNode& node);
+    Result forget(const ArchiveNode& node);
 
     Kxg::Catalogue& mCatalogue;
 };

@@ -35,22 +35,16 @@ QString textOf(const QByteArray& bytes)
 /// Why a study's tag file cannot be read, more plainly than the reader can tell.
 QString reasonOf(const QString& path, const TagFile& tried)
 {
-    FileStatus status;
-    if (!statusOf(pathBytes(path).constData(), status))
+    const FilePresence presence = presenceOf(path);
+    if (presence == FilePresence::Absent)
         return QStringLiteral("has no tag file");
-    if (status.size == 0)
+    if (presence == FilePresence::Empty)
         return QStringLiteral("has an empty tag file, %1").arg(path);
     TagFile any;
     if (any.readCacheFile(path, nullptr, false))
         return QStringLiteral("has a tag file, %1, that holds study %2")
             .arg(path, textOf(any.studyInstanceUID()));
     return QStringLiteral("has a tag file, %1, that cannot be read: %2").arg(path, tried.failure());
-}
-
-bool isThere(const QString& path)
-{
-    FileStatus status;
-    return statusOf(pathBytes(path).constData(), status);
 }
 
 QByteArray baseName(const QByteArray& path)
@@ -148,7 +142,7 @@ bool StudyCheck::read(const QByteArray& studyUID, TagFile& file)
         return true;
     // One that waits to be built for the first time has none yet, which was told.
     const QString path = TagFile::cacheFilePathForStudy(studyUID.constData());
-    if (!mContents.isWaiting || isThere(path)) {
+    if (!mContents.isWaiting || presenceOf(path) != FilePresence::Absent) {
         ++mFindings.unreadable;
         mReport(QStringLiteral("Study %1 %2").arg(textOf(studyUID), reasonOf(path, file)));
     }
@@ -252,10 +246,9 @@ void StudyCheck::checkUnknown(const QString& path)
     TagFile file;
     if (!file.readCacheFile(path, nullptr, false)) {
         ++mFindings.unreadable;
-        FileStatus status;
-        const bool isEmpty = statusOf(pathBytes(path).constData(), status) && status.size == 0;
-        mReport(isEmpty ? QStringLiteral("The tag file %1 is empty").arg(path)
-                        : QStringLiteral("The tag file %1 cannot be read: %2").arg(path, file.failure()));
+        mReport(presenceOf(path) == FilePresence::Empty
+                    ? QStringLiteral("The tag file %1 is empty").arg(path)
+                    : QStringLiteral("The tag file %1 cannot be read: %2").arg(path, file.failure()));
         return;
     }
     const QString study = textOf(file.studyInstanceUID());

@@ -1,16 +1,12 @@
 #include "kddlib/archive/StudyCompletion.h"
 
 #include "kddlib/TagFileGenerator.h"
-#include "kddlib/archive/ArchiveDatabase.h"
 #include "kddlib/tagfile/StudyRecord.h"
-#include "kddlib/tagfile/TagFileRemoval.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
-#include "platform/base/LogFile.h"
 #include "platform/resources/ExResource.h"
 
 #include <QDateTime>
-#include <QThread>
 
 #include <algorithm>
 #include <iterator>
@@ -21,21 +17,16 @@ namespace Kdd
 namespace
 {
 
-/// For about two minutes while others hold the file: each attempt to merge waits two seconds, one to remove not at all.
+/// Each waits two seconds, so it goes on for two minutes while others hold the file.
 constexpr int kMergeAttempts = 60;
-constexpr int kRemovalAttempts = 6000;
-constexpr unsigned long kPause = 20;  // [ms]
 
-bool removeStudyFile(const QByteArray& studyUID)
+/// "The tag file of study ... is not built", or whatever else was not done, with the reason.
+CompletedStudy failed(const char* format, const QByteArray& studyUID, const QString& reason)
 {
-    const QString path = TagFile::cacheFilePathForStudy(studyUID.constData());
-    for (int i = 0; i < kRemovalAttempts; ++i) {
-        if (removeTagFileOnce(path) == 0)
-            return true;
-        QThread::msleep(kPause);
-    }
-    LogFile::errorf("The tag file of study %s cannot be removed: others hold it", studyUID.constData());
-    return false;
+    const QString what = QString::fromLatin1(format).arg(QString::fromUtf8(studyUID));
+    CompletedStudy completed;
+    completed.result = Result::failure(reason).within(what);
+    return completed;
 }
 
 /// A study whose tag file shows the order in which it came about.
@@ -51,8 +42,9 @@ Kxg::BuiltStudy unsettled(const TagFile& file)
 CompletedStudy StudyCompletion::complete(Kxg::StudyClaim& claim, TagFile& arrivals,
                                          const QVector<qint64>& requests)
 {
-    if (!readContents(claim))
-        return {};
+    Result read = readContents(claim);
+    if (read.bad())
+        return {read, false, {}};
     if (mContents.images.empty())
         return remove(claim);
     TagFile present;
@@ -63,8 +55,9 @@ CompletedStudy StudyCompletion::complete(Kxg::StudyClaim& claim, TagFile& arriva
 
 CompletedStudy StudyCompletion::reduce(Kxg::StudyClaim& claim)
 {
-    if (!readContents(claim))
-        return {};
+    Result read = readContents(claim);
+    if (read.bad())
+        return {read, false, {}};
     if (mContents.images.empty())
         return remove(claim);
     TagFile present;
@@ -77,42 +70,43 @@ CompletedStudy StudyCompletion::reduce(Kxg::StudyClaim& claim)
     }
     const std::vector<QByteArray> gone = unlisted(present);
     std::vector<const char*> keys;
+    keys.reserve(gone.size());
     for (const QByteArray& key : gone)
         keys.push_back(key.constData());
     present.removeImages(static_cast<int>(keys.size()), keys.data());
     present.createAbstractTags();
     present.optimizeAll();
-    if (!present.writeCacheFile()) {
-        LogFile::errorf("Study %s is not changed: %s", studyUID.constData(),
-                        qUtf8Printable(present.failure()));
-        return {};
-    }
-    return {succeeded(claim.finish(unsettled(present))), false, present.statistics()};
+    if (!present.writeCacheFile())
+        return failed("Study %1 is not changed", studyUID, present.failure());
+    return {claim.finish(unsettled(present)), false, present.statistics()};
 }
 
 CompletedStudy StudyCompletion::build(Kxg::StudyClaim& claim)
 {
-    if (!readContents(claim))
-        return {};
+    Result read = readContents(claim);
+    if (read.bad())
+        return {read, false, {}};
     return mContents.images.empty() ? remove(claim) : build(claim, TagFile());
 }
 
 /// What was requested up to now is seen by what is read after it.
-bool StudyCompletion::readContents(Kxg::StudyClaim& claim)
+Result StudyCompletion::readContents(Kxg::StudyClaim& claim)
 {
-    if (!succeeded(claim.noteRequests()) ||
-        !succeeded(mCatalogue.studyContents(claim.studyInstanceUID(), mContents)))
-        return false;
+    Result result = claim.noteRequests();
+    if (result.good())
+        result = mCatalogue.studyContents(claim.studyInstanceUID(), mContents);
     mListed.clear();
     for (const Kxg::ListedImage& image : mContents.images)
         mListed.insert(image.key());
-    return true;
+    return result;
 }
 
 CompletedStudy StudyCompletion::remove(Kxg::StudyClaim& claim)
 {
-    const bool isRemoved = removeStudyFile(claim.studyInstanceUID()) && succeeded(claim.finishRemoved());
-    return {isRemoved, isRemoved, {}};
+    Result result = TagFileGenerator::removeTagFile(claim.studyInstanceUID());
+    if (result.good())
+        result = claim.finishRemoved();
+    return {result, result.good(), {}};
 }
 
 CompletedStudy StudyCompletion::build(Kxg::StudyClaim& claim, const TagFile& loaded) const
@@ -120,19 +114,18 @@ CompletedStudy StudyCompletion::build(Kxg::StudyClaim& claim, const TagFile& loa
     TagFile whole;
     const QByteArray& studyUID = claim.studyInstanceUID();
     TagFileGenerator generator(nullptr, mOptimize);
-    if (!generator.createTagFile(whole, claim.studyId(), studyUID.constData(), loaded)) {
-        LogFile::errorf("The tag file of study %s is not built: %s", studyUID.constData(),
-                        whole.isEmpty() ? "none of its files could be read"
-                                        : qUtf8Printable(whole.failure()));
-        return {};
-    }
+    if (!generator.createTagFile(whole, claim.studyId(), studyUID.constData(), loaded))
+        return failed("The tag file of study %1 is not built", studyUID,
+                      whole.isEmpty() ? QStringLiteral("none of its files could be read") : whole.failure());
     // What could not be read stays as it was, and the next build tries again.
     Kxg::BuiltStudy built = builtStudy(whole);
-    built.isComplete = generator.numKept() == 0 && generator.numMissing() == 0;
-    if (!built.isComplete)
-        LogFile::errorf("Study %s is built, but goes on waiting: %d files could not be read",
-                        studyUID.constData(), generator.numKept() + generator.numMissing());
-    return {succeeded(claim.finish(built)) && built.isComplete, false, whole.statistics()};
+    const int numUnread = generator.numKept() + generator.numMissing();
+    built.isComplete = numUnread == 0;
+    Result result = claim.finish(built);
+    if (result.good() && numUnread > 0)
+        return failed("Study %1 is built, but goes on waiting", studyUID,
+                      QStringLiteral("%1 files could not be read").arg(numUnread));
+    return {result, false, whole.statistics()};
 }
 
 /// Volumes are made of images that may be anywhere in the study, and a correction may lead an arrival elsewhere: such
@@ -184,12 +177,10 @@ CompletedStudy StudyCompletion::merge(Kxg::StudyClaim& claim, TagFile& arrivals,
     bool isMerged = arrivals.mergeIntoCacheFile();
     for (int i = 1; i < kMergeAttempts && !isMerged && arrivals.wasLockedOut(); ++i)
         isMerged = arrivals.mergeIntoCacheFile();
-    if (!isMerged) {
-        LogFile::errorf("The tag file of study %s is not completed: %s", claim.studyInstanceUID().constData(),
-                        qUtf8Printable(arrivals.failure()));
-        return {};
-    }
-    return {succeeded(claim.finish(unsettled(arrivals))), false, arrivals.statistics()};
+    if (!isMerged)
+        return failed("The tag file of study %1 is not completed", claim.studyInstanceUID(),
+                      arrivals.failure());
+    return {claim.finish(unsettled(arrivals)), false, arrivals.statistics()};
 }
 
 }  // namespace Kdd

@@ -14,7 +14,7 @@ namespace Kdd
 /// What became of a study that was to be completed.
 struct CompletedStudy
 {
-    bool isDone = false;     ///< false: the reason is logged, and the study goes on waiting
+    Result result;           ///< on failure the study goes on waiting
     bool isRemoved = false;  ///< the catalogue has no image of it, so it has no tag file any more
     TagFile::Statistics statistics;
 };
@@ -53,7 +53,7 @@ public:
     CompletedStudy build(Kxg::StudyClaim& claim);
 
 private:
-    bool readContents(Kxg::StudyClaim& claim);
+    Result readContents(Kxg::StudyClaim& claim);
     static CompletedStudy remove(Kxg::StudyClaim& claim);
     CompletedStudy build(Kxg::StudyClaim& claim, const TagFile& loaded) const;
     bool canMerge(const QByteArray& studyUID, const TagFile& arrivals, const QVector<qint64>& requests,

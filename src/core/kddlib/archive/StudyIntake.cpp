@@ -1,9 +1,9 @@
 #include "kddlib/archive/StudyIntake.h"
 
+#include "kddlib/TagFileGenerator.h"
 #include "kddlib/archive/ArchiveDatabase.h"
 #include "kddlib/archive/FileWalk.h"
 #include "kddlib/archive/StudyCompletion.h"
-#include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
 
@@ -27,64 +27,62 @@ StudyIntake::StudyIntake(Kxg::Catalogue& catalogue, WorkObserver& observer)
 {
 }
 
-bool StudyIntake::take(DicomInput input)
+Result StudyIntake::take(DicomInput input)
 {
-    if (!mRegistration.add(input))
-        return false;
-    return input.kind != DicomInput::Kind::Image || place(input);
+    Result registered = mRegistration.add(input);
+    return registered.good() && input.kind == DicomInput::Kind::Image ? place(input) : registered;
 }
 
-bool StudyIntake::place(DicomInput& input)
+Result StudyIntake::place(DicomInput& input)
 {
     PendingStudy& study = mPending[input.studyUID];
     const QByteArray& path = input.path;
     const int before = study.file.imagesByUID().size();
-    // The last of several files of one image is kept, as when they are added one after the other.
-    TagMap* image = study.file.addTagMap(input.map.release(), path.constData(), true);
-    if (image == nullptr) {
+    if (TagFileGenerator::place(study.file, std::move(input.map), path) == nullptr) {
         LogFile::errorf("Could not take %s: it belongs nowhere", path.constData());
         mRefused.push_back({path, QStringLiteral("It belongs nowhere")});
-        return true;
+        return {};
     }
-    image->putAndInsertValue(kFilePath, VrCode::LO, path);
     const int added = study.file.imagesByUID().size() - before;
     study.images += added;
     mPendingImages += added;
     study.lastTouched = ++mClock;
     study.fileBytes += input.fileBytes;
     study.headerBytes += input.headerBytes;
-    return mPendingImages <= kMaxPendingImages || writeLongestUntouched();
+    return mPendingImages <= kMaxPendingImages ? Result() : writeLongestUntouched();
 }
 
-bool StudyIntake::writeLongestUntouched()
+Result StudyIntake::writeLongestUntouched()
 {
     return write(std::min_element(mPending.begin(), mPending.end(), [](const auto& a, const auto& b) {
         return a.second.lastTouched < b.second.lastTouched;
     }));
 }
 
-/// False when the database failed; a study that cannot be completed is told and counted.
-bool StudyIntake::write(Pending::iterator study)
+Result StudyIntake::write(Pending::iterator study)
 {
-    if (!mRegistration.flush())
-        return false;
+    Result registered = mRegistration.flush();
+    if (registered.bad())
+        return registered;
     // Corrections may have led all its files elsewhere.
     if (!mRegistration.requests(study->first).isEmpty())
         complete(study->first, &study->second);
     mPendingImages -= study->second.images;
     mPending.erase(study);
-    return true;
+    return {};
 }
 
-bool StudyIntake::finish()
+Result StudyIntake::finish()
 {
     // Registered first, so that all of it is in the queue when somebody cancels.
-    if (!mRegistration.flush())
-        return false;
+    Result result = mRegistration.flush();
+    if (result.bad())
+        return result;
     const int total = static_cast<int>(mPending.size());
     while (!mPending.empty() && !mObserver.isCancelled()) {
-        if (!write(mPending.begin()))
-            return false;
+        result = write(mPending.begin());
+        if (result.bad())
+            return result;
         mObserver.progress(total - static_cast<int>(mPending.size()), total);
     }
     // Volume files without images, and studies that files were taken from.
@@ -92,26 +90,27 @@ bool StudyIntake::finish()
         if (!mCompleted.contains(studyUID) && !mObserver.isCancelled())
             complete(studyUID, nullptr);
     }
-    return true;
+    return {};
 }
 
-bool StudyIntake::complete(const QByteArray& studyUID, PendingStudy* arrivals)
+void StudyIntake::complete(const QByteArray& studyUID, PendingStudy* arrivals)
 {
     mCompleted.insert(studyUID);
-    const std::unique_ptr<Kxg::StudyClaim> claim = claimStudy(mCatalogue, studyUID);
+    std::unique_ptr<Kxg::StudyClaim> claim;
     CompletedStudy completed;
+    completed.result = claimStudy(mCatalogue, studyUID, claim);
     if (claim != nullptr) {
         StudyCompletion completion(mCatalogue);
         completed = arrivals != nullptr
                         ? completion.complete(*claim, arrivals->file, mRegistration.requests(studyUID))
                         : completion.build(*claim);
     }
-    if (!completed.isDone) {
+    if (!succeeded(completed.result)) {
         mRefused.push_back({studyUID, QStringLiteral("Its tag file is not completed; it waits to be built")});
-        return false;
+        return;
     }
     if (completed.isRemoved)
-        return true;
+        return;
     StudyTotals& totals = mTotals[studyUID];
     totals.series = completed.statistics.series;
     totals.images = completed.statistics.images;
@@ -121,16 +120,16 @@ bool StudyIntake::complete(const QByteArray& studyUID, PendingStudy* arrivals)
         totals.fileBytes += arrivals->fileBytes;
         totals.headerBytes += arrivals->headerBytes;
     }
-    return true;
 }
 
-bool StudyIntake::completeWaiting(const QList<QByteArray>& paths)
+Result StudyIntake::completeWaiting(const QList<QByteArray>& paths)
 {
     QSet<QByteArray> waiting;
     for (const QByteArray& path : paths) {
         QVector<QByteArray> studies;
-        if (!succeeded(mCatalogue.waitingStudies(absolutePath(path), studies)))
-            return false;
+        Result asked = mCatalogue.waitingStudies(absolutePath(path), studies);
+        if (asked.bad())
+            return asked;
         for (const QByteArray& study : qAsConst(studies))
             waiting.insert(study);
     }
@@ -138,7 +137,7 @@ bool StudyIntake::completeWaiting(const QList<QByteArray>& paths)
         if (!mObserver.isCancelled())
             complete(studyUID, nullptr);
     }
-    return true;
+    return {};
 }
 
 }  // namespace Kdd

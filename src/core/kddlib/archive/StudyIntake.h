@@ -36,15 +36,15 @@ public:
     /// Both must outlive the object.
     StudyIntake(Kxg::Catalogue& catalogue, WorkObserver& observer);
 
-    /// False when the database failed, which is logged.
-    bool take(DicomInput input);
+    /// Failure: that of the database. A file that cannot be taken is logged and refused instead.
+    Result take(DicomInput input);
 
-    /// Completes all that was touched; when the observer cancels, the rest stays in the queue. False when the database
-    /// failed.
-    bool finish();
+    /// Completes all that was touched; when the observer cancels, the rest stays in the queue. Failure: that of the
+    /// database. A study that cannot be completed is logged and refused instead.
+    Result finish();
 
     /// Completes what an earlier intake registered below the paths without coming to the end of it.
-    bool completeWaiting(const QList<QByteArray>& paths);
+    Result completeWaiting(const QList<QByteArray>& paths);
 
     /// By Study Instance UID.
     const QMap<QByteArray, StudyTotals>& studies() const { return mTotals; }
@@ -65,10 +65,10 @@ private:
 
     using Pending = std::map<QByteArray, PendingStudy>;
 
-    bool place(DicomInput& input);
-    bool write(Pending::iterator study);
-    bool writeLongestUntouched();
-    bool complete(const QByteArray& studyUID, PendingStudy* arrivals);
+    Result place(DicomInput& input);
+    Result write(Pending::iterator study);
+    Result writeLongestUntouched();
+    void complete(const QByteArray& studyUID, PendingStudy* arrivals);
 
     Kxg::Catalogue& mCatalogue;
     WorkObserver& mObserver;

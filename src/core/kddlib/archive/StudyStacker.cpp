@@ -46,11 +46,11 @@ bool StudyStacker::stack(const QByteArray& studyUID)
     mMade = {};
     mIsChanged = false;
     mSeries.clear();
-    const std::unique_ptr<Kxg::StudyClaim> claim = claimStudy(mCatalogue, studyUID);
-    if (claim == nullptr)
+    std::unique_ptr<Kxg::StudyClaim> claim;
+    if (!succeeded(claimStudy(mCatalogue, studyUID, claim)))
         return false;
     const bool isDone = run();
-    return (!mIsChanged || StudyCompletion(mCatalogue).build(*claim).isDone) && isDone;
+    return (!mIsChanged || succeeded(StudyCompletion(mCatalogue).build(*claim).result)) && isDone;
 }
 
 bool StudyStacker::run()
@@ -98,7 +98,7 @@ bool StudyStacker::stackSeries(const QByteArray& seriesUID, const TagMap& series
     bool isDone = true;
     int index = 0;
     for (const Stack& stack : plan.stacks) {
-        if (!writeVolume(seriesUID, stack, index)) {
+        if (!succeeded(writeVolume(seriesUID, stack, index))) {
             isDone = false;
             continue;
         }
@@ -127,18 +127,18 @@ bool StudyStacker::clearSeries(const QByteArray& seriesUID, const TagMap& series
     return true;
 }
 
-bool StudyStacker::writeVolume(const QByteArray& seriesUID, const Stack& stack, int index)
+Result StudyStacker::writeVolume(const QByteArray& seriesUID, const Stack& stack, int index)
 {
-    if (!makeFolder(mFolder)) {
-        LogFile::errorf("Could not create folder %s", qUtf8Printable(mFolder));
-        return false;
-    }
+    if (!makeFolder(mFolder))
+        return Result::failure(QStringLiteral("Could not create folder %1").arg(mFolder));
     const QByteArray path = volumePath(seriesUID, index);
+    Result written = writeStack(stack, filePathOf, path);
     FileStatus status;
-    if (!succeeded(writeStack(stack, filePathOf, path)) || !statusOf(path.constData(), status))
-        return false;
-    mMade.volumes.push_back({path, {status.size, status.modified}, mStudyUID, seriesUID});
-    return true;
+    if (written.good() && !statusOf(path.constData(), status))
+        return Result::failure(QStringLiteral("Volume file %1 is gone again").arg(pathText(path)));
+    if (written.good())
+        mMade.volumes.push_back({path, {status.size, status.modified}, mStudyUID, seriesUID});
+    return written;
 }
 
 QByteArray StudyStacker::volumePath(const QByteArray& seriesUID, int index) const

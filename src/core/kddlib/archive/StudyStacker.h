@@ -39,7 +39,7 @@ public:
     /// The catalogue must outlive the object.
     StudyStacker(Kxg::Catalogue& catalogue, StackOptions options);
 
-    /// False when anything failed, which is logged. Volumes that were made are registered nevertheless.
+    /// False when anything failed, each of which is logged. Volumes that were made are registered nevertheless.
     bool stack(const QByteArray& studyUID);
 
     /// Of the study stacked last.
@@ -50,7 +50,7 @@ private:
     void removeUnfinished() const;
     bool stackSeries(const QByteArray& seriesUID, const TagMap& series);
     bool clearSeries(const QByteArray& seriesUID, const TagMap& series, bool& isStacked);
-    bool writeVolume(const QByteArray& seriesUID, const Stack& stack, int index);
+    Result writeVolume(const QByteArray& seriesUID, const Stack& stack, int index);
     QByteArray volumePath(const QByteArray& seriesUID, int index) const;
 
     Kxg::Catalogue& mCatalogue;

@@ -91,6 +91,7 @@ OFCondition ItemOF::findAndGetUint16(const DcmTagKey& key, Uint16& value)
     OFCondition condition = mItem->findAndGetElement(key, element);
     if (condition.bad())
         return condition;
+    // What is signed or unsigned, such as a padding value, is asked for by its bits alone.
     if (element->getVR() == EVR_SS) {
         Sint16 number = 0;
         element->getSint16(number);

@@ -20,8 +20,7 @@ namespace Kdd
 namespace
 {
 
-constexpr double kRepresentativePart = 0.3;  // of a video's duration; its beginning is often black
-constexpr float kNoTensor = 0.001F;          // marks pixels of a tensor image where none was measured
+constexpr float kNoTensor = 0.001F;  // marks pixels of a tensor image where none was measured
 constexpr int kTensorBytes = 24;
 constexpr float kVeryLarge = 1e10F;
 
@@ -251,7 +250,7 @@ TypedData2D PreviewGenerator::createPreviewImage(const QString& path, int width,
     if (!file.isFile())
         return {};
     return KxCompressedDataMedia::decodeRepresentativeFrame(path, 0, file.size(), width, height,
-                                                            kRepresentativePart);
+                                                            KxCompressedDataMedia::kRepresentative);
 }
 
 QImage PreviewGenerator::convertToQImage(const KxVolumeInfo* info, int width, int height)

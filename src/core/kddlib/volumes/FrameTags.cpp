@@ -5,8 +5,6 @@
 
 #include <dcmtk/dcmdata/dcdeftag.h>
 
-#include <cmath>
-
 namespace Kdd
 {
 
@@ -55,19 +53,6 @@ int FrameTags::numFrameGroups(const TagMap& image)
 {
     const TagSequence* sequence = sequenceOf(image, DCM_PerFrameFunctionalGroupsSequence);
     return sequence != nullptr ? sequence->numItems() : 0;
-}
-
-QVector<double> numbersOf(const QByteArray& text)
-{
-    QVector<double> numbers;
-    const QList<QByteArray> words = text.split('\\');
-    for (const QByteArray& word : words) {
-        bool ok = false;
-        numbers.append(word.trimmed().toDouble(&ok));
-        if (!ok || !std::isfinite(numbers.last()))
-            return {};
-    }
-    return numbers;
 }
 
 }  // namespace Kdd

@@ -1,7 +1,6 @@
 #pragma once
 
 #include <QByteArray>
-#include <QVector>
 
 #include <dcmtk/config/osconfig.h>
 
@@ -39,8 +38,5 @@ private:
     const TagMap* mOwnGroups;
     const TagMap* mSharedGroups;
 };
-
-/// The numbers of a multi-valued text; none when one of them is no number or not finite.
-QVector<double> numbersOf(const QByteArray& text);
 
 }  // namespace Kdd

@@ -38,6 +38,7 @@ void RescaleSlopeCalculator::add(float slope, float intercept, int bitsStored, b
         effectiveIntercept = intercept - asFloat(offset) * slope;
     }
     compareWithFirst(slope, effectiveIntercept, bitsStored);
+    // Stored values that are physical values already need no range of their own.
     if (slope != 1 || intercept != 0)
         widenRange(rawMin * slope + effectiveIntercept, rawMax * slope + effectiveIntercept);
 }

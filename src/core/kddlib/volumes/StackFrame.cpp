@@ -1,6 +1,8 @@
 #include "kddlib/volumes/StackFrame.h"
 
 #include "kddlib/tagmodel/TagMap.h"
+#include "platform/base/Decimal.h"
+#include "platform/base/Result.h"
 
 #include <dcmtk/dcmdata/dcdeftag.h>
 
@@ -25,77 +27,78 @@ int integerOf(const TagMap& image, const DcmTagKey& key, int fallback)
     return image.findAndGetInt(key, value) ? value : fallback;
 }
 
-QString named(const char* attribute, const QByteArray& value)
+/// An attribute with which there is no slice.
+Result refuse(const char* attribute, const QByteArray& value)
 {
-    if (value.isEmpty())
-        return QStringLiteral("%1 is missing").arg(QLatin1String(attribute));
-    return QStringLiteral("%1 is \"%2\"").arg(QLatin1String(attribute), QString::fromLatin1(value));
+    const QLatin1String name(attribute);
+    return Result::failure(value.isEmpty()
+                               ? QStringLiteral("%1 is missing").arg(name)
+                               : QStringLiteral("%1 is \"%2\"").arg(name, QString::fromLatin1(value)));
 }
 
-QString named(const char* attribute, int value)
+Result refuse(const char* attribute, int value)
 {
-    return named(attribute, QByteArray::number(value));
+    return refuse(attribute, QByteArray::number(value));
 }
 
 /// Localizers are not stacked although some lie parallel: nobody reads them as a volume. A mosaic shows many slices in
 /// one image. The frames of a segmentation are masks of several things in the same planes.
-QString whyTypeIsNoSlice(const FrameTags& at)
+Result checkType(const FrameTags& at)
 {
     const QByteArray type = at.text(DCM_ImageType);
     const QByteArray modality = at.text(DCM_Modality);
     if (modality == "SEG")
-        return named("Modality", modality);
+        return refuse("Modality", modality);
     const QList<QByteArray> words = type.split('\\');
     for (const QByteArray& word : words) {
         if (word.trimmed() == "LOCALIZER" || word.trimmed() == "MOSAIC")
-            return named("Image Type", type);
+            return refuse("Image Type", type);
     }
     return {};
 }
 
-QString whyPixelsAreNoSlice(const FrameTags& at)
+Result checkPixels(const FrameTags& at)
 {
     const TagMap& image = at.image();
     const QByteArray photometric = at.text(DCM_PhotometricInterpretation);
     const int samples = integerOf(image, DCM_SamplesPerPixel, 1);
     const int bits = integerOf(image, DCM_BitsStored, 0);
     if (image.findElement(DCM_PixelData) == nullptr)
-        return named("Pixel Data", QByteArray());
+        return refuse("Pixel Data", QByteArray());
     if (photometric != "MONOCHROME1" && photometric != "MONOCHROME2")
-        return named("Photometric Interpretation", photometric);
+        return refuse("Photometric Interpretation", photometric);
     if (samples != 1)
-        return named("Samples per Pixel", samples);
+        return refuse("Samples per Pixel", samples);
     // What has more bits is a dose, a parameter map or a calculation, not an image that viewers stack.
     if (bits < 1 || bits > 16)
-        return named("Bits Stored", bits);
+        return refuse("Bits Stored", bits);
     if (image.findElement(DCM_ModalityLUTSequence) != nullptr)
-        return QStringLiteral("It has a Modality LUT Sequence instead of a rescale");
+        return Result::failure(QStringLiteral("It has a Modality LUT Sequence instead of a rescale"));
     return {};
 }
 
-QString whySizeIsNoSlice(const FrameTags& at, int frames)
+Result checkSize(const FrameTags& at, int frames)
 {
     const TagMap& image = at.image();
     const int columns = integerOf(image, DCM_Columns, 0);
     const int rows = integerOf(image, DCM_Rows, 0);
     const int groups = FrameTags::numFrameGroups(image);
     if (columns < 1 || columns > 65535)
-        return named("Columns", columns);
+        return refuse("Columns", columns);
     if (rows < 1 || rows > 65535)
-        return named("Rows", rows);
+        return refuse("Rows", rows);
     if (frames > 1 && groups != frames)
-        return QStringLiteral("Number of Frames is %1, but %2 frames have a position")
-            .arg(frames)
-            .arg(groups);
+        return Result::failure(
+            QStringLiteral("Number of Frames is %1, but %2 frames have a position").arg(frames).arg(groups));
     return {};
 }
 
-QString whyNoSlice(const FrameTags& at, int frames)
+Result checkImage(const FrameTags& at, int frames)
 {
-    QString reason = whyPixelsAreNoSlice(at);
-    if (reason.isEmpty())
-        reason = whyTypeIsNoSlice(at);
-    return reason.isEmpty() ? whySizeIsNoSlice(at, frames) : reason;
+    Result checked = checkPixels(at);
+    if (checked.good())
+        checked = checkType(at);
+    return checked.good() ? checkSize(at, frames) : checked;
 }
 
 /// What all frames have in common.
@@ -131,15 +134,15 @@ void readPadding(StackFrame& frame)
     frame.paddingMax = qMax(value, limit);
 }
 
-QString readPosition(StackFrame& frame)
+Result readPosition(StackFrame& frame)
 {
     const QByteArray text = frame.tags.text(DCM_PlanePositionSequence, DCM_ImagePositionPatient);
     const QVector<double> p = numbersOf(text);
     if (p.size() != 3)
-        return named("Image Position (Patient)", text);
+        return refuse("Image Position (Patient)", text);
     for (const double value : p) {
         if (std::fabs(value) > kMaxPosition)
-            return named("Image Position (Patient)", text);
+            return refuse("Image Position (Patient)", text);
     }
     frame.position = {p[0], p[1], p[2]};
     return {};
@@ -151,32 +154,32 @@ bool isUnit(const Vec3d& direction)
 }
 
 /// Directions are made exactly orthonormal, so that rounded cosines do not shear the stack.
-QString readOrientation(StackFrame& frame)
+Result readOrientation(StackFrame& frame)
 {
     const QByteArray text = frame.tags.text(DCM_PlaneOrientationSequence, DCM_ImageOrientationPatient);
     const QVector<double> c = numbersOf(text);
     if (c.size() != 6)
-        return named("Image Orientation (Patient)", text);
+        return refuse("Image Orientation (Patient)", text);
     const Vec3d row{c[0], c[1], c[2]};
     const Vec3d column{c[3], c[4], c[5]};
     if (!isUnit(row) || !isUnit(column) || std::fabs(dot(row, column)) > kDirectionTolerance)
-        return named("Image Orientation (Patient)", text) +
-               QStringLiteral(", which are no right-angled directions");
+        return Result::failure(refuse("Image Orientation (Patient)", text).text() +
+                               QStringLiteral(", which are no right-angled directions"));
     frame.alongRow = row * (1 / length(row));
     const Vec3d straight = column - frame.alongRow * dot(frame.alongRow, column);
     frame.alongColumn = straight * (1 / length(straight));
     return {};
 }
 
-QString readSpacing(StackFrame& frame)
+Result readSpacing(StackFrame& frame)
 {
     const QByteArray text = frame.tags.text(DCM_PixelMeasuresSequence, DCM_PixelSpacing);
     const QVector<double> spacing = numbersOf(text);
     if (spacing.size() != 2)
-        return named("Pixel Spacing", text);
+        return refuse("Pixel Spacing", text);
     for (const double value : spacing) {
         if (value < 1 / kMaxSpacing || value > kMaxSpacing)
-            return named("Pixel Spacing", text);
+            return refuse("Pixel Spacing", text);
     }
     frame.rowSpacing = spacing[0];
     frame.columnSpacing = spacing[1];
@@ -195,22 +198,22 @@ bool readNumber(const QByteArray& text, double& number)
     return true;
 }
 
-QString readRescale(StackFrame& frame)
+Result readRescale(StackFrame& frame)
 {
     const DcmTagKey group = DCM_PixelValueTransformationSequence;
     const QByteArray slope = frame.tags.text(group, DCM_RescaleSlope);
     const QByteArray intercept = frame.tags.text(group, DCM_RescaleIntercept);
     if (!readNumber(slope, frame.slope) || static_cast<float>(frame.slope) == 0)
-        return named("Rescale Slope", slope);
-    return readNumber(intercept, frame.intercept) ? QString() : named("Rescale Intercept", intercept);
+        return refuse("Rescale Slope", slope);
+    return readNumber(intercept, frame.intercept) ? Result() : refuse("Rescale Intercept", intercept);
 }
 
-QString readFrame(StackFrame& frame)
+Result readFrame(StackFrame& frame)
 {
     for (const auto read : {readPosition, readOrientation, readSpacing, readRescale}) {
-        QString reason = read(frame);
-        if (!reason.isEmpty())
-            return reason;
+        Result result = read(frame);
+        if (result.bad())
+            return result;
     }
     return {};
 }
@@ -226,9 +229,9 @@ QVector<StackFrame> stackFramesOf(const TagMap& image, QVector<LeftOutFrame>& le
 {
     const int count = qMax(1, integerOf(image, DCM_NumberOfFrames, 1));
     const QByteArray uid = image.uid(TagMap::ImageLevel);
-    const QString reason = whyNoSlice(FrameTags(image, 0), count);
-    if (!reason.isEmpty()) {
-        leftOut.append({uid, -1, reason});
+    const Result checked = checkImage(FrameTags(image, 0), count);
+    if (checked.bad()) {
+        leftOut.append({uid, -1, checked.text()});
         return {};
     }
 
@@ -242,11 +245,11 @@ QVector<StackFrame> stackFramesOf(const TagMap& image, QVector<LeftOutFrame>& le
         StackFrame frame = common;
         frame.tags = FrameTags(image, i);
         frame.frame = i;
-        const QString fault = readFrame(frame);
-        if (fault.isEmpty())
+        const Result read = readFrame(frame);
+        if (read.good())
             frames.append(frame);
         else
-            leftOut.append(leftOutFrame(frame, fault));
+            leftOut.append(leftOutFrame(frame, read.text()));
     }
     return frames;
 }

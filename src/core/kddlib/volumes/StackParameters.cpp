@@ -4,6 +4,7 @@
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/StackPlanner.h"
 #include "kddlib/volumes/StackValues.h"
+#include "platform/base/Decimal.h"
 #include "platform/volumefile/SOPInstanceUtility.h"
 
 #include <QSet>

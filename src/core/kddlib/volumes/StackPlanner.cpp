@@ -2,8 +2,7 @@
 
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/StackSplit.h"
-
-#include <QHash>
+#include "platform/base/Result.h"
 
 #include <dcmtk/dcmdata/dcdeftag.h>
 
@@ -90,38 +89,23 @@ QVector<StackFrames> groupedByKind(const QVector<StackFrame>& frames, QVector<Le
     return groups;
 }
 
-/// Frames of equal Frame of Reference together, in the order of first appearance.
-QVector<StackFrames> partedByReference(const StackFrames& group)
-{
-    QHash<QByteArray, int> partOf;
-    QVector<StackFrames> parts;
-    for (const StackFrame* frame : group) {
-        const auto known = partOf.constFind(frame->frameOfReference);
-        const int part = known != partOf.constEnd() ? *known : parts.size();
-        if (part == parts.size()) {
-            partOf.insert(frame->frameOfReference, part);
-            parts.append(StackFrames());
-        }
-        parts[part].append(frame);
-    }
-    return parts;
-}
-
 /// Parts too small for a stack are told here, where it is known that there are more slices like them.
 QVector<StackFrames> partedByReference(const QVector<StackFrames>& groups, QVector<LeftOutFrame>& leftOut)
 {
     QVector<StackFrames> result;
     for (const StackFrames& group : groups) {
-        const QVector<StackFrames> parts = partedByReference(group);
+        const QVector<StackFrames> parts =
+            partedBy(group, [](const StackFrame& frame) { return frame.frameOfReference; });
         const bool areCut = parts.size() > 1 && group.size() >= kLeastSlices;
         for (const StackFrames& part : parts) {
-            if (areCut && part.size() < kLeastSlices)
+            if (areCut && part.size() < kLeastSlices) {
                 leaveOut(
                     part,
                     QStringLiteral("Its Frame of Reference is not that of the other slices of its geometry"),
                     leftOut);
-            else
+            } else {
                 result.append(part);
+            }
         }
     }
     // As the frames lie in the series.
@@ -169,26 +153,26 @@ QVector<StackFrames> runsOf(StackFrames frames)
 }
 
 /// Steps that are each nearly right may still add up.
-QString whyUneven(const StackFrames& run)
+Result checkSpacing(const StackFrames& run)
 {
     const Vec3d step = meanStep(run);
     for (int i = 0; i < run.size(); ++i) {
         const double off = length(run.at(i)->position - (run.first()->position + step * i));
         if (off > toleranceFor(step))
-            return QStringLiteral("The slices are not evenly spaced: %1 lies off by %2 mm")
-                .arg(QString::fromLatin1(run.at(i)->imageUID))
-                .arg(off);
+            return Result::failure(QStringLiteral("The slices are not evenly spaced: %1 lies off by %2 mm")
+                                       .arg(QString::fromLatin1(run.at(i)->imageUID))
+                                       .arg(off));
     }
     return {};
 }
 
-QString whyNoStack(const StackFrames& run)
+Result checkRun(const StackFrames& run)
 {
     if (run.size() < kLeastSlices)
-        return QStringLiteral("A stack needs %1 slices at equal distances, here are %2")
-            .arg(kLeastSlices)
-            .arg(run.size());
-    return whyUneven(run);
+        return Result::failure(QStringLiteral("A stack needs %1 slices at equal distances, here are %2")
+                                   .arg(kLeastSlices)
+                                   .arg(run.size()));
+    return checkSpacing(run);
 }
 
 Mat4f matrixOf(const Vec3d& x, const Vec3d& y, const Vec3d& z, const Vec3d& origin)
@@ -234,11 +218,11 @@ void planGroup(const StackFrames& group, StackPlan& plan)
     for (const StackFrames& part : parts) {
         const QVector<StackFrames> runs = runsOf(part);
         for (const StackFrames& run : runs) {
-            const QString reason = whyNoStack(run);
-            if (reason.isEmpty())
+            const Result checked = checkRun(run);
+            if (checked.good())
                 plan.stacks.append(stackOf(run));
             else
-                leaveOut(run, reason, plan.leftOut);
+                leaveOut(run, checked.text(), plan.leftOut);
         }
     }
 }

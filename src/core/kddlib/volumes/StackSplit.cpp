@@ -84,24 +84,6 @@ int mostInOnePlane(const StackFrames& frames)
     return most;
 }
 
-/// Frames of equal value together, in the order of first appearance.
-QVector<StackFrames> partedBy(const SplitKey& key, const StackFrames& frames)
-{
-    QHash<QByteArray, int> partOf;
-    QVector<StackFrames> parts;
-    for (const StackFrame* frame : frames) {
-        const QByteArray value = frame->tags.text(key.group, key.key);
-        const auto known = partOf.constFind(value);
-        const int part = known != partOf.constEnd() ? *known : parts.size();
-        if (part == parts.size()) {
-            partOf.insert(value, part);
-            parts.append(StackFrames());
-        }
-        parts[part].append(frame);
-    }
-    return parts;
-}
-
 /// Whether no part has more than its fair share of a plane. An attribute that differs from slice to slice, such as some
 /// trigger times, makes more parts than there are frames in a plane. The last part may be incomplete.
 bool isEven(const QVector<StackFrames>& parts, int most)
@@ -132,6 +114,24 @@ QVector<StackFrames> partedByOrder(const StackFrames& frames, int most, QVector<
 
 }  // namespace
 
+QVector<StackFrames> partedBy(const StackFrames& frames,
+                              const std::function<QByteArray(const StackFrame&)>& valueOf)
+{
+    QHash<QByteArray, int> partOf;
+    QVector<StackFrames> parts;
+    for (const StackFrame* frame : frames) {
+        const QByteArray value = valueOf(*frame);
+        const auto known = partOf.constFind(value);
+        const int part = known != partOf.constEnd() ? *known : parts.size();
+        if (part == parts.size()) {
+            partOf.insert(value, part);
+            parts.append(StackFrames());
+        }
+        parts[part].append(frame);
+    }
+    return parts;
+}
+
 double positionAlong(const StackFrame& like, const StackFrame& frame)
 {
     return dot(frame.position, like.normal());
@@ -143,7 +143,8 @@ QVector<StackFrames> splitByPlane(const StackFrames& frames, QVector<LeftOutFram
     if (most <= 1)
         return {frames};
     for (const SplitKey& key : kSplitKeys) {
-        const QVector<StackFrames> parts = partedBy(key, frames);
+        const QVector<StackFrames> parts =
+            partedBy(frames, [&](const StackFrame& frame) { return frame.tags.text(key.group, key.key); });
         if (!isEven(parts, most))
             continue;
         QVector<StackFrames> result;
