@@ -10,7 +10,7 @@
 namespace Kdd
 {
 
-/// A download as the source of DCMTK's parser.
+/// A download as the source of DCMTK's parser. Used by one thread at a time.
 class KDD_EXPORT DcmCurlProducer : public DownloadProducer
 {
 public:
@@ -18,7 +18,7 @@ public:
 };
 
 /// A download as DCMTK's parser reads it. Values cannot be left where they are to be read later: the parser has to be
-/// told to read all of them.
+/// told to read all of them. Used by one thread at a time.
 class KDD_EXPORT DcmInputCurlStream : public DcmInputStream
 {
 public:

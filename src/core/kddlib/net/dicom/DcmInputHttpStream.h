@@ -12,7 +12,7 @@
 namespace Kdd
 {
 
-/// A request of its own as the source of DCMTK's parser. Without one it is in error.
+/// A request of its own as the source of DCMTK's parser. Without one it is in error. Used by one thread at a time.
 class KDD_EXPORT DcmHttpProducer : public DownloadProducer
 {
 public:
@@ -22,6 +22,7 @@ public:
 };
 
 /// A file of a storage server as DCMTK's parser reads it. As with a download, all values have to be read at once.
+/// Used by one thread at a time.
 class KDD_EXPORT DcmInputHttpStream : public DcmInputStream
 {
 public:
