@@ -54,7 +54,7 @@ TEST_F(CommandLine, IsCompletedByBash)
                               QStringLiteral(KDD_DESCRIPTIONS "/kdd.bash"));
     for (const Case& one : kCases) {
         QString words = QLatin1String(one.line);
-        words.replace(QLatin1String("STORE"), mFolder.filePath(QStringLiteral("store")))
+        words.replace(QLatin1String("STORE"), path("store"))
             .replace(QLatin1String("|"), QLatin1String("\"\""));
         script += QStringLiteral("COMP_WORDS=(%1); COMP_CWORD=$((${#COMP_WORDS[@]} - 1)); _kdd; echo "
                                  "$(printf '%s\\n' \"${COMPREPLY[@]}\" | sort)\n")

@@ -20,7 +20,6 @@ protected:
     /// Runs commands of the documentation one after the other in one shell; the error output says which one failed.
     Answer shell(const QStringList& commands) const;
 
-    QString path(const char* name) const { return mFolder.filePath(QString::fromLatin1(name)); }
     void putBeside(const char* name, const QByteArray& content) const;
     Answer run(const QString& program, const QStringList& arguments) const;
 

@@ -11,18 +11,12 @@ class Json : public CommandLine
 protected:
     struct Row
     {
-        const char* command;  // FILE, JOB and OUT stand for names
+        const char* command;
         int exitCode;
         bool hasResult = true;
     };
 
-    Answer run(const char* command) const
-    {
-        QByteArray words = command;
-        words.replace("FILE", file("1").toUtf8()).replace("JOB", file("job.xml").toUtf8());
-        words.replace("OUT", mFolder.filePath(QStringLiteral("out")).toUtf8());
-        return kdd(("--json " + words).constData());
-    }
+    Answer run(const char* command) const { return kdd(("--json " + QByteArray(command)).constData()); }
 
     void expectWhole(const Row& row) const
     {
@@ -41,9 +35,9 @@ TEST_F(Json, IsWholeOrAbsentWhateverTheCommandComesTo)
     const Row kRows[] = {
         {"list", 0},
         {"list --date x", 2, false},
-        {"index FILE", 0},
-        {"index FILE none", 1},
-        {"add FILE", 0},
+        {"index @1", 0},
+        {"index @1 none", 1},
+        {"add @1", 0},
         {"add none", 1},
         {"build --all", 0},
         {"build 9", 1, false},
@@ -57,20 +51,20 @@ TEST_F(Json, IsWholeOrAbsentWhateverTheCommandComesTo)
         {"metadata 1.2 --image 9", 1, false},
         {"stat 1.2", 0},
         {"stat 9", 1, false},
-        {"previews --all OUT", 0},
-        {"previews 9 OUT", 1},
+        {"previews --all @out", 0},
+        {"previews 9 @out", 1},
         {"sync 1.2", 0},
         {"sync 9", 1, false},
         {"verify --all", 0},
         {"verify 9", 1},
         {"diff 1.2 1.2", 0},
-        {"diff FILE none", 1, false},
-        {"sample OUT --images 1", 0},
+        {"diff @1 none", 1, false},
+        {"sample @out --images 1", 0},
         {"sample /proc/kdd", 1, false},
-        {"get http://127.0.0.1:1/x -o OUT", 1, false},
+        {"get http://127.0.0.1:1/x -o @out", 1, false},
         {"put none gs://b/o", 1, false},
-        {"qa JOB --study 1.2 --image 1", 0},
-        {"qa JOB --study 1.2 --image 9", 1},
+        {"qa @job.xml --study 1.2 --image 1", 0},
+        {"qa @job.xml --study 1.2 --image 9", 1},
         {"qa none --study 1.2 --image 1", 1, false},
         {"delete 1.2 --image 9", 1, false},
         {"delete 1.2 --image 1", 0},
