@@ -2,10 +2,7 @@
 #include "SampleArchive.h"
 #include "kddlib/tagfile/QAData.h"
 
-#include <QRegularExpression>
 #include <QSettings>
-
-#include <set>
 
 using namespace Kdd;
 
@@ -20,11 +17,10 @@ class Blocks : public SampleArchive
 TEST_F(Blocks, AllSayInWhichLanguageTheyAreAndAreTested)
 {
     // "text" is for layouts and diagrams, which nothing can run.
-    const std::set<QString> kLanguages = {
-        QStringLiteral("c"),      QStringLiteral("console"), QStringLiteral("cpp"), QStringLiteral("ini"),
-        QStringLiteral("python"), QStringLiteral("text"),    QStringLiteral("xml")};
+    const QStringList languages =
+        QStringLiteral("c cmake console cpp ini python sh text xml").split(QLatin1Char(' '));
     for (const Block& block : allBlocks())
-        EXPECT_EQ(kLanguages.count(block.language), 1U)
+        EXPECT_TRUE(languages.contains(block.language))
             << block.place() << " is in \"" << block.language.toStdString()
             << "\", which no test knows how to run";
     EXPECT_EQ(blocksIn("cpp").size() + blocksIn("c").size(), std::size_t(KDD_COMPILED_BLOCKS))
@@ -59,6 +55,19 @@ TEST_F(Blocks, InPythonRunAsFarAsTheirModulesAreThere)
     }
     if (QFile::exists(path("a.vol"))) {
         EXPECT_EQ(shell({QStringLiteral("kdd --json index a.vol")}).number("volumes"), 1);
+    }
+}
+
+/// What installs, or belongs into a project of the reader's own, is parsed only.
+TEST_F(Blocks, ForTheShellAndCMakeAreWellFormed)
+{
+    for (const Block& block : blocksIn("sh")) {
+        putBeside("block.sh", block.text.toUtf8());
+        EXPECT_EQ(shell({QStringLiteral("sh -n block.sh")}).exitCode, 0) << block.place();
+    }
+    for (const Block& block : blocksIn("cmake")) {
+        putBeside("block.cmake", "if(FALSE)\n" + block.text.toUtf8() + "endif()\n");
+        EXPECT_EQ(shell({QStringLiteral("cmake -P block.cmake")}).exitCode, 0) << block.place();
     }
 }
 

@@ -3,8 +3,6 @@
 #include <QRegularExpression>
 #include <QStandardPaths>
 
-#include <set>
-
 using namespace Kdd;
 
 namespace
