@@ -18,23 +18,15 @@ class Archive : public CommandLine
 protected:
     int sample(int count) const
     {
-        const Answer answer = kdd("sample --json --images", QStringList{QString::number(count), images()});
+        const Answer answer = kdd(("sample --json @ --images " + QByteArray::number(count)).constData());
         EXPECT_EQ(answer.exitCode, 0) << answer.err.toStdString();
         return answer.number("images");
-    }
-
-    int waiting() const
-    {
-        int count = 0;
-        for (const QJsonValue& study : kdd("list --json").json("studies").toArray())
-            count += study.toObject().value(QLatin1String("waiting")).toBool() ? 1 : 0;
-        return count;
     }
 
     /// The content of every tag file by its path below the meta folder.
     QMap<QString, QByteArray> tagFiles(const char* store = "store") const
     {
-        const QDir meta(mFolder.filePath(QString::fromLatin1(store) + QStringLiteral("/meta")));
+        const QDir meta(path(store) + QStringLiteral("/meta"));
         QMap<QString, QByteArray> contents;
         for (QDirIterator it(meta.path(), {QStringLiteral("*.tc")}, QDir::Files,
                              QDirIterator::Subdirectories);
@@ -46,24 +38,24 @@ protected:
         return contents;
     }
 
-    Answer indexImages() const { return kdd("index --json", QStringList{images()}); }
+    Answer indexImages() const { return kdd("index --json @"); }
 };
 
 TEST_F(Archive, WhatIsIndexedWaitsAndWhatIsBuiltDoesNot)
 {
     addTwoStudies();
     const QByteArray added = kdd("metadata 1.2").out;
-    QDir(mFolder.filePath(QStringLiteral("store"))).removeRecursively();
+    QDir(path("store")).removeRecursively();
     EXPECT_EQ(indexImages().number("images"), 4);
-    EXPECT_EQ(waiting(), 2);
+    EXPECT_EQ(listed("--waiting"), "1.2 1.3");
     EXPECT_EQ(kdd("build 1.3 --json").number("images"), 1);
-    EXPECT_EQ(waiting(), 1);
+    EXPECT_EQ(listed("--waiting"), "1.2");
     EXPECT_EQ(kdd("build --all --json").number("studies"), 1);
     EXPECT_EQ(kdd("metadata 1.2").out, added);
     EXPECT_EQ(indexImages().number("unchanged"), 4);
     EXPECT_EQ(kdd("build --all --json").number("studies"), 0);
     EXPECT_EQ(kdd("build --all --again --json --jobs 3").number("studies"), 2);
-    QDir(mFolder.filePath(QStringLiteral("store/meta"))).removeRecursively();
+    QDir(path("store/meta")).removeRecursively();
     EXPECT_EQ(kdd("build --json").number("studies"), 0) << "nothing changed";
     EXPECT_EQ(kdd("build --all --json").number("studies"), 2) << "but their tag files are gone";
     EXPECT_EQ(kdd("build 9.9").exitCode, 1);
@@ -78,7 +70,7 @@ TEST_F(Archive, AddingCompletesWhatAnEarlierRunOnlyRegistered)
     EXPECT_EQ(again.number("unchanged"), 5);
     EXPECT_EQ(again.number("studies"), 1);
     EXPECT_EQ(imagesOf("1.2"), 4);
-    EXPECT_EQ(waiting(), 0);
+    EXPECT_EQ(listed("--waiting"), "");
     const QMap<QString, QByteArray> before = tagFiles();
     EXPECT_EQ(addImages().number("studies"), 0);
     EXPECT_EQ(tagFiles(), before);
@@ -100,7 +92,7 @@ TEST_F(Archive, BuildsThatAreKilledAreCompletedByTheNext)
         EXPECT_EQ(finish(*second).exitCode, 0);
     }
     EXPECT_EQ(kdd("build --all").exitCode, 0);
-    EXPECT_EQ(waiting(), 0);
+    EXPECT_EQ(listed("--waiting"), "");
     const Answer verified = kdd("verify --all --json");
     EXPECT_EQ(verified.exitCode, 0) << verified.err.toStdString();
     EXPECT_EQ(verified.number("images"), images);
@@ -110,7 +102,7 @@ TEST_F(Archive, BothEnginesGiveTheSameTagFiles)
 {
     sample(60);
     const QStringList onServer = {QStringLiteral("--database"), QString::fromLatin1(newPostgresDatabase()),
-                                  QStringLiteral("--meta"), mFolder.filePath(QStringLiteral("server/meta"))};
+                                  QStringLiteral("--meta"), path("server/meta")};
     EXPECT_EQ(indexImages().exitCode, 0);
     EXPECT_EQ(kdd("build --all --jobs 2").exitCode, 0);
     EXPECT_EQ(kdd("index", onServer + QStringList{images()}).exitCode, 0);
@@ -131,16 +123,14 @@ TEST_F(Archive, SeriesBecomeVolumesAndStudiesPictures)
     EXPECT_GT(stacked.number("volumes"), 0);
     EXPECT_EQ(kdd("stack --json").number("volumes"), 0) << "they have volumes already";
     EXPECT_EQ(kdd("stack --json --again").number("volumes"), stacked.number("volumes"));
-    EXPECT_EQ(waiting(), 0) << "what stacking left in the queue is done";
+    EXPECT_EQ(listed("--waiting"), "") << "what stacking left in the queue is done";
     EXPECT_EQ(stacked.out.count("\"hadVolumes\":true"), 2) << "those of the sample stay alone";
     EXPECT_EQ(kdd("verify --all").exitCode, 0);
-    const QString sheet = mFolder.filePath(QStringLiteral("sheet.png"));
-    const QString pictures = mFolder.filePath(QStringLiteral("pictures"));
-    const Answer previews = kdd("previews --all --json --sheet", QStringList{sheet, pictures});
+    const Answer previews = kdd("previews --all --json --sheet @sheet.png @pictures");
     EXPECT_GT(previews.number("previews"), 10);
-    EXPECT_EQ(QDir(pictures).entryList(QDir::Files).size(), previews.number("previews"));
-    EXPECT_GT(QImage(sheet).width(), 300);
-    EXPECT_EQ(kdd("previews --all", QStringList{QStringLiteral("/proc/kdd")}).exitCode, 1);
+    EXPECT_EQ(QDir(file("pictures")).entryList(QDir::Files).size(), previews.number("previews"));
+    EXPECT_GT(QImage(file("sheet.png")).width(), 300);
+    EXPECT_EQ(kdd("previews --all /proc/kdd").exitCode, 1);
 }
 
 TEST_F(Archive, ADamagedFileThatWasTakenIsReadByWhateverComesLater)
@@ -148,9 +138,8 @@ TEST_F(Archive, ADamagedFileThatWasTakenIsReadByWhateverComesLater)
     save("1", anImage("1"));
     save("2", anImage("2").with(DCM_PatientName, "Doe^J").withLong(DCM_TextValue, 3000));
     put("2", bytes("2").chopped(100));
-    const QStringList tolerant = {QStringLiteral("--tolerant"), images()};
     EXPECT_EQ(addImages().number("failed"), 1);
-    const Answer taken = kdd("add --json", tolerant);
+    const Answer taken = kdd("add --json --tolerant @");
     EXPECT_EQ(taken.number("failed"), 0);
     EXPECT_EQ(taken.number("images"), 2);
     EXPECT_TRUE(taken.err.contains("left out (0040,a160)")) << taken.err.toStdString();
@@ -164,18 +153,9 @@ TEST_F(Archive, ADamagedFileThatWasTakenIsReadByWhateverComesLater)
 
 TEST_F(Archive, SlicesOfDifferentFramesOfReferenceAreStackedOnRequest)
 {
-    for (const char* number : {"1", "2", "3", "4"}) {
-        DatasetBuilder slice = anImage(number).with(DCM_InstanceNumber, number);
-        slice.with(DCM_ImagePositionPatient, (std::string("0\\0\\") + number).c_str());
-        slice.with(DCM_ImageOrientationPatient, "1\\0\\0\\0\\1\\0").with(DCM_PixelSpacing, "1\\1");
-        slice.with(DCM_Columns, "4").with(DCM_Rows, "3").with(DCM_PhotometricInterpretation, "MONOCHROME2");
-        slice.with(DCM_SamplesPerPixel, "1").with(DCM_BitsAllocated, "16").with(DCM_BitsStored, "16");
-        slice.with(DCM_HighBit, "15").with(DCM_PixelRepresentation, "0");
-        slice.with(DCM_FrameOfReferenceUID, number);
-        const Uint16 pixels[12] = {0, 1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11};
-        slice.dataset().putAndInsertUint16Array(DCM_PixelData, pixels, 12);
-        save(number, slice);
-    }
+    int place = 0;
+    for (const char* uid : {"1", "2", "3", "4"})
+        save(uid, aSlice(uid, ++place).with(DCM_FrameOfReferenceUID, uid));
     EXPECT_EQ(addImages().number("failed"), 0);
     EXPECT_TRUE(kdd("stack").out.contains("    4 left out: Its Frame of Reference")) << "told once";
     EXPECT_EQ(kdd("stack --json --ignore-frame-of-reference").number("volumes"), 1);
@@ -199,11 +179,8 @@ TEST_F(Archive, ADatabaseThatCannotBeUsedIsNamed)
     for (const QString& address :
          {QStringLiteral("sqlite:/proc/none/kdd"), QStringLiteral("sqlite:") + file("no-database"),
           QStringLiteral("postgresql://nobody@127.0.0.1:1/kdd"), QStringLiteral("oracle:x")}) {
-        for (const char* command : {"list", "build --all", "add"}) {
-            QStringList arguments = {QStringLiteral("--database"), address};
-            if (qstrcmp(command, "add") == 0)
-                arguments.append(images());
-            const Answer answer = kdd(command, arguments);
+        for (const char* command : {"list", "build --all", "add @"}) {
+            const Answer answer = kdd(command, QStringList{QStringLiteral("--database"), address});
             EXPECT_EQ(answer.exitCode, 1) << command << address.toStdString();
             EXPECT_TRUE(answer.err.contains(address.section(QLatin1Char(':'), 0, 0).toUtf8()));
         }

@@ -62,18 +62,24 @@ struct Answer
 class CommandLine : public testing::Test
 {
 protected:
-    QString images() const { return mFolder.filePath(QStringLiteral("images")); }
+    QString path(const char* name) const { return mFolder.filePath(QString::fromLatin1(name)); }
+    QString images() const { return path("images"); }
     QString file(const char* name) const { return images() + QLatin1Char('/') + QString::fromUtf8(name); }
 
-    /// Arguments are separated by blanks; `more` follows.
+    /// Arguments are separated by blanks, "@NAME" is a file of the folder of images and "@" that itself; `more` follows.
     std::unique_ptr<Process> start(const char* arguments, const QStringList& more = {},
                                    qint64 largestFile = kNoLimit) const
     {
         auto process = std::make_unique<Process>(largestFile);
         process->setProgram(QStringLiteral(KDD_BINARY));
-        process->setArguments(
-            QStringList{QStringLiteral("--store"), mFolder.filePath(QStringLiteral("store"))} +
-            QString::fromLatin1(arguments).split(QLatin1Char(' '), Qt::SkipEmptyParts) + more);
+        QStringList words{QStringLiteral("--store"), path("store")};
+        for (const QByteArray& word : QByteArray(arguments).split(' ')) {
+            if (word.startsWith('@'))
+                words.append(word.size() == 1 ? images() : file(word.constData() + 1));
+            else if (!word.isEmpty())
+                words.append(QString::fromLatin1(word));
+        }
+        process->setArguments(words + more);
         process->start();
         return process;
     }
@@ -95,9 +101,25 @@ protected:
         return finish(*start(arguments, more...));
     }
 
+    /// A picture that can be stacked.
+    static DatasetBuilder aSlice(const char* uid, int number, const char* study = "1.2")
+    {
+        const QByteArray text = QByteArray::number(number);
+        DatasetBuilder image = anImage(uid).inStudy(study).inSeries((QByteArray(study) + ".1").constData());
+        image.with(DCM_PatientName, "Doe^J").with(DCM_InstanceNumber, text.constData());
+        image.with(DCM_ImagePositionPatient, ("0\\0\\" + text).constData()).with(DCM_PixelSpacing, "1\\1");
+        image.with(DCM_ImageOrientationPatient, "1\\0\\0\\0\\1\\0").with(DCM_FrameOfReferenceUID, study);
+        image.with(DCM_Columns, "4").with(DCM_Rows, "3").with(DCM_PhotometricInterpretation, "MONOCHROME2");
+        image.with(DCM_SamplesPerPixel, "1").with(DCM_BitsAllocated, "16").with(DCM_BitsStored, "16");
+        image.with(DCM_HighBit, "15").with(DCM_PixelRepresentation, "0");
+        const Uint16 pixels[12] = {0, 1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11};
+        image.dataset().putAndInsertUint16Array(DCM_PixelData, pixels, 12);
+        return image;
+    }
+
     Answer addImages(qint64 largestFile = kNoLimit) const
     {
-        return kdd("add --json", QStringList{images()}, largestFile);
+        return kdd("add --json @", QStringList(), largestFile);
     }
 
     int imagesOf(const char* study) const
@@ -139,14 +161,15 @@ protected:
                              "\"unchanged\":0,\"volumes\":0}\n");
     }
 
-    /// The UIDs that `list` names.
-    QStringList listedStudies() const
+    /// The UIDs that `list` names, in order and separated by blanks.
+    std::string listed(const QByteArray& arguments = QByteArray()) const
     {
         QStringList uids;
-        for (const QJsonValue& study : kdd("list --json").json("studies").toArray())
+        for (const QJsonValue& study :
+             kdd(("list --json " + arguments).constData()).json("studies").toArray())
             uids.append(study.toObject().value(QLatin1String("study")).toString());
         uids.sort();
-        return uids;
+        return uids.join(QLatin1Char(' ')).toStdString();
     }
 
     QTemporaryDir mFolder;

@@ -15,7 +15,7 @@ namespace
 TEST_F(CommandLine, TellsWhatItHolds)
 {
     addTwoStudies();
-    EXPECT_EQ(listedStudies(), (QStringList{QStringLiteral("1.2"), QStringLiteral("1.3")}));
+    EXPECT_EQ(listed(), "1.2 1.3");
     const Answer stat = kdd("stat 1.2 --json");
     EXPECT_EQ(stat.number("series"), 2);
     EXPECT_EQ(stat.number("images"), 3);
@@ -25,11 +25,9 @@ TEST_F(CommandLine, TellsWhatItHolds)
     EXPECT_EQ(kdd("show 1.2 --tree --verbose").out.count("image "), 3);
     EXPECT_EQ(kdd("show 1.2 --series 1.2.3 --image 3").exitCode, 1);
     EXPECT_EQ(QJsonDocument::fromJson(kdd("metadata 1.2").out).array().size(), 3);
-    const QJsonObject one =
-        QJsonDocument::fromJson(kdd("metadata 1.2 --image 1").out).array().at(0).toObject();
-    EXPECT_EQ(QJsonDocument(one.value(QLatin1String("00080018")).toObject()).toJson(QJsonDocument::Compact),
-              "{\"Value\":[\"1\"],\"vr\":\"UI\"}");
-    EXPECT_TRUE(one.value(QLatin1String("0040A160")).toObject().contains(QLatin1String("BulkDataURI")));
+    const QByteArray one = kdd("metadata 1.2 --image 1").out;
+    EXPECT_TRUE(one.contains("\"00080018\":{\"vr\":\"UI\",\"Value\":[\"1\"]}"));
+    EXPECT_TRUE(one.contains("\"0040A160\":{\"vr\":\"UT\",\"BulkDataURI\":"));
     EXPECT_EQ(kdd("verify --all --json").out,
               "{\"differences\":0,\"images\":4,\"studies\":2,\"unreadable\":0}\n");
 }
@@ -41,7 +39,7 @@ TEST_F(CommandLine, AddingAgainAndInPiecesGivesTheSame)
     EXPECT_EQ(imagesOf("1.2"), 3);
     save("2", anImage("2").inSeries("1.2.4").with(DCM_PatientName, "Doe^Jane"));
     save("5", anImage("5").with(DCM_PatientName, "Doe^J"));
-    EXPECT_EQ(kdd("add --json --compression lzma", QStringList{file("2"), file("5")}).number("images"), 4);
+    EXPECT_EQ(kdd("add --json --compression lzma @2 @5").number("images"), 4);
     EXPECT_EQ(kdd("verify --all --json").out,
               "{\"differences\":0,\"images\":5,\"studies\":2,\"unreadable\":0}\n");
 }
@@ -51,7 +49,7 @@ TEST_F(CommandLine, ProcessesThatAddToOneStudyAtOnceLoseNothing)
     std::vector<std::unique_ptr<Process>> processes;
     for (const char* uid : {"1", "2", "3", "4", "5", "6"}) {
         save(uid, anImage(uid));
-        processes.push_back(start("add", {file(uid)}));
+        processes.push_back(start(QByteArray("add @").append(uid).constData()));
     }
     for (const auto& process : processes)
         EXPECT_EQ(finish(*process).exitCode, 0);
@@ -68,7 +66,7 @@ TEST_F(CommandLine, CountsWhatItCannotTakeAndGoesOn)
     put("zeros", QByteArray(2000, '\0'));
     QFile::link(QStringLiteral("gone"), file("vanished"));
     QFile::link(QStringLiteral("loop"), file("loop"));
-    const Answer answer = kdd("add --json", QStringList{images(), file("nowhere")});
+    const Answer answer = kdd("add --json @ @nowhere");
     EXPECT_EQ(answer.exitCode, 1);
     EXPECT_EQ(answer.number("failed"), 6);
     EXPECT_EQ(answer.number("skipped"), 2);
@@ -78,7 +76,7 @@ TEST_F(CommandLine, CountsWhatItCannotTakeAndGoesOn)
         EXPECT_TRUE(answer.err.contains(name)) << name;
     EXPECT_FALSE(answer.err.contains("letter.txt"));
     put("memo.txt", "Dear colleague");
-    const Answer verbose = kdd("add --verbose", QStringList{images()});
+    const Answer verbose = kdd("add --verbose @");
     EXPECT_TRUE(verbose.err.contains("memo.txt"));
     EXPECT_FALSE(verbose.err.contains("letter.txt")) << "it is known to be no image";
     EXPECT_EQ(kdd("verify --all").exitCode, 0);
@@ -111,7 +109,7 @@ TEST_F(CommandLine, RefusesUidsThatAreATrap)
     const Answer answer = addImages();
     EXPECT_EQ(answer.exitCode, 1);
     EXPECT_EQ(answer.number("failed"), 4);
-    EXPECT_TRUE(listedStudies().isEmpty());
+    EXPECT_EQ(listed(), "");
 }
 
 TEST_F(CommandLine, NeverSendsControlCharactersToTheTerminal)
@@ -199,7 +197,7 @@ TEST_F(CommandLine, WrongUsageIsToldFromFailure)
         EXPECT_EQ(answer.exitCode, 1) << command;
         EXPECT_TRUE(answer.err.contains("kdd.sqlite")) << answer.err.toStdString();
     }
-    EXPECT_FALSE(QDir(mFolder.filePath(QStringLiteral("store"))).exists()) << "nobody asked for one";
+    EXPECT_FALSE(QDir(path("store")).exists()) << "nobody asked for one";
     QDir().mkpath(images());
     EXPECT_EQ(addImages().exitCode, 0);
     EXPECT_EQ(kdd("list --json").out, "{\"studies\":[]}\n") << "an empty store is no fault";
@@ -210,14 +208,14 @@ TEST_F(CommandLine, DiffNamesEachDifference)
 {
     addTwoStudies();
     save("other", anImage("1").with(DCM_PatientName, "Roe^R").withLong(DCM_TextValue, 3000));
-    EXPECT_EQ(kdd("diff", QStringList{file("1"), file("1")}).exitCode, 0);
-    const Answer answer = kdd("diff --json", QStringList{file("1"), file("other")});
+    EXPECT_EQ(kdd("diff @1 @1").exitCode, 0);
+    const Answer answer = kdd("diff --json @1 @other");
     EXPECT_EQ(answer.exitCode, 1);
     ASSERT_EQ(answer.json("differences").toArray().size(), 1);
     EXPECT_TRUE(answer.out.contains("\"name\":\"PatientName\""));
     EXPECT_EQ(kdd("diff 1.2 1.2").exitCode, 0);
     EXPECT_EQ(kdd("diff 1.2 1.3 --json").json("differences").toArray().size(), 4);
-    EXPECT_EQ(kdd("diff 1.2", QStringList{file("nowhere")}).exitCode, 1);
+    EXPECT_EQ(kdd("diff 1.2 @nowhere").exitCode, 1);
 }
 
 TEST_F(CommandLine, VerifyNoticesWhatChangedOnDisk)
@@ -244,9 +242,9 @@ TEST_F(CommandLine, DeletesWhatIsNamedAndNothingElse)
     EXPECT_EQ(imagesOf("1.2"), 1);
     EXPECT_EQ(kdd("delete 1.2 --image 2").exitCode, 0);
     EXPECT_EQ(kdd("delete", QStringList{QString()}).exitCode, 1) << "an unset variable of a script";
-    EXPECT_EQ(listedStudies(), QStringList{QStringLiteral("1.3")});
+    EXPECT_EQ(listed(), "1.3");
     EXPECT_EQ(kdd("delete 1.3").exitCode, 0);
-    EXPECT_TRUE(listedStudies().isEmpty());
+    EXPECT_EQ(listed(), "");
 }
 
 TEST_F(CommandLine, ADamagedTagFileIsNamedAndTheOthersAreVerified)
@@ -256,12 +254,12 @@ TEST_F(CommandLine, ADamagedTagFileIsNamedAndTheOthersAreVerified)
     const Answer answer = kdd("verify --all");
     EXPECT_EQ(answer.exitCode, 1);
     EXPECT_TRUE(answer.err.contains("damaged.tc"));
-    EXPECT_EQ(listedStudies().size(), 2);
+    EXPECT_EQ(listed(), "1.2 1.3");
 }
 
 TEST_F(CommandLine, SampleStudiesComeThroughUnchanged)
 {
-    ASSERT_EQ(kdd("sample --images 40", QStringList{images()}).exitCode, 0);
+    ASSERT_EQ(kdd("sample --images 40 @").exitCode, 0);
     EXPECT_EQ(addImages().number("images"), 40);
     const Answer verified = kdd("verify --all --json");
     EXPECT_EQ(verified.exitCode, 0) << verified.err.toStdString();

@@ -19,10 +19,7 @@ using Uids = QList<QByteArray>;
 class Correction : public CommandLine
 {
 protected:
-    Correction()
-    {
-        TagFile::setMetaFolder(mFolder.filePath(QStringLiteral("store/meta")).toLocal8Bit().constData());
-    }
+    Correction() { TagFile::setMetaFolder(path("store/meta").toLocal8Bit().constData()); }
 
     QString job(const QByteArray& oldStudy, const char* key, const QByteArray& value) const
     {

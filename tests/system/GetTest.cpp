@@ -17,9 +17,9 @@ protected:
     Get() { QDir().mkpath(images()); }
 
     /// Into the folder of images, under the URL's own name.
-    Answer get(const std::string& url, const char* options = "get --json") const
+    Answer get(const std::string& url, const char* options = "get --json -o @") const
     {
-        return kdd(options, QStringList{QString::fromStdString(url), QStringLiteral("-o"), images()});
+        return kdd(options, QStringList{QString::fromStdString(url)});
     }
 
     QByteArray fetched(const char* name) const
@@ -122,8 +122,7 @@ TEST_F(Resumed, BeginsAnewWhenTheObjectIsAnother)
 TEST_F(Resumed, KeepsWhatItHasWhenTheDiskIsFull)
 {
     cuts = false;
-    const Answer full = finish(*start(
-        "get --json", {QString::fromStdString(server.url()), QStringLiteral("-o"), images()}, 1'000'000));
+    const Answer full = kdd("get --json -o @", QStringList{QString::fromStdString(server.url())}, 1'000'000);
     EXPECT_EQ(full.exitCode, 1);
     EXPECT_TRUE(full.err.contains("object.part cannot be written: File too large")) << full.err.toStdString();
     EXPECT_EQ(get(server.url()).number("resumedAt"), 1'000'000);

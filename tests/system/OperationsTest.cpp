@@ -13,21 +13,6 @@ namespace
 class Operations : public CommandLine
 {
 protected:
-    static DatasetBuilder slice(const char* uid, const char* study, int number)
-    {
-        const QByteArray text = QByteArray::number(number);
-        DatasetBuilder image = anImage(uid).inStudy(study).inSeries((QByteArray(study) + ".1").constData());
-        image.with(DCM_PatientName, "Doe^J").with(DCM_InstanceNumber, text.constData());
-        image.with(DCM_ImagePositionPatient, ("0\\0\\" + text).constData()).with(DCM_PixelSpacing, "1\\1");
-        image.with(DCM_ImageOrientationPatient, "1\\0\\0\\0\\1\\0").with(DCM_FrameOfReferenceUID, study);
-        image.with(DCM_Columns, "4").with(DCM_Rows, "3").with(DCM_PhotometricInterpretation, "MONOCHROME2");
-        image.with(DCM_SamplesPerPixel, "1").with(DCM_BitsAllocated, "16").with(DCM_BitsStored, "16");
-        image.with(DCM_HighBit, "15").with(DCM_PixelRepresentation, "0");
-        const Uint16 pixels[12] = {0, 1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11};
-        image.dataset().putAndInsertUint16Array(DCM_PixelData, pixels, 12);
-        return image;
-    }
-
     /// Images 7.N.1 to 7.N.8 of studies 1.1 to 1.3, of which those with a number below `count` are there so far.
     void saveImages(int count)
     {
@@ -36,7 +21,7 @@ protected:
                 const QByteArray uid = "7." + QByteArray::number(study) + '.' + QByteArray::number(i);
                 const QByteArray studyUID = "1." + QByteArray::number(study);
                 if (!QFile::exists(file(uid.constData())))
-                    save(uid.constData(), slice(uid.constData(), studyUID.constData(), i));
+                    save(uid.constData(), aSlice(uid.constData(), i, studyUID.constData()));
                 mExpected.insert(uid);
             }
         }
@@ -54,7 +39,7 @@ protected:
 
     std::unique_ptr<Process> begin(const QByteArray& command) const
     {
-        return start(command.constData(), command == "add" ? QStringList{images()} : QStringList());
+        return start(command == "add" ? "add @" : command.constData());
     }
 
     QByteArray saveJob(const QByteArray& patient) const
@@ -62,7 +47,7 @@ protected:
         put("../job.xml", "<Job><Timestamp>20240131120000</Timestamp><Login>anna</Login><Substitutions><Tag "
                           "Group='0010' Element='0010'><Value>" +
                               patient + "</Value></Tag></Substitutions></Job>");
-        return mFolder.filePath(QStringLiteral("job.xml")).toUtf8();
+        return path("job.xml").toUtf8();
     }
 
     void kill(const QByteArray& command)

@@ -5,7 +5,7 @@
 namespace Kdd
 {
 
-/// What this build is, for version output and user agents.
+/// What this build is, for version output and user agents. May be used on any thread.
 class KDD_EXPORT BuildInfo
 {
 public:

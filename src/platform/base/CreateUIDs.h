@@ -7,13 +7,14 @@
 namespace Kdd
 {
 
-/// New DICOM UIDs, below the root 2.25 that anybody may use: a random UUID as a decimal number.
+/// New DICOM UIDs, below the root 2.25 that anybody may use: a random UUID as a decimal number. May be used on any
+/// thread.
 class KDD_EXPORT CreateUIDs
 {
 public:
     enum Kind { Study = 0, Series = 1, Instance = 2 };
 
-    /// At most 64 characters. On any thread.
+    /// At most 64 characters.
     static QByteArray createUID(Kind kind);
 };
 

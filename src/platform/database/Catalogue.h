@@ -182,7 +182,8 @@ struct StudySummary
 };
 
 /// The right to build one study's tag file, which one holder has at a time among all processes and machines. It ends
-/// with the object, and also when its process dies. The catalogue it came from must outlive it.
+/// with the object, and also when its process dies. The catalogue it came from must outlive it. Used by the thread of
+/// that.
 class KDD_EXPORT StudyClaim
 {
 public:

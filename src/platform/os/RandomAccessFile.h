@@ -22,7 +22,8 @@ struct FileIdentity
     }
 };
 
-/// A file read at any place, without a position of its own. Closed when the object goes.
+/// A file read at any place, without a position of its own. Closed when the object goes. Once it is open any number
+/// of threads may read.
 class KDD_EXPORT RandomAccessFile
 {
 public:

@@ -21,7 +21,7 @@ public:
 };
 
 /// Videos. The decoders are in a module of their own that is loaded when the first video is met: they cost every
-/// process that links them 40 ms, and their licence binds whoever ships them.
+/// process that links them 40 ms, and their licence binds whoever ships them. May be used on any thread.
 class KDD_EXPORT KxCompressedDataMedia
 {
 public:

@@ -19,7 +19,7 @@ class OrlanMesh;
 
 /// The pixels that a preview is made of, and how they are to be shown.
 ///
-/// A value behind a shared pointer; nothing of it changes once it is made.
+/// A value behind a shared pointer; nothing of it changes once it is made. Any thread may use it.
 class KDD_EXPORT KxVolumeInfo
 {
 public:

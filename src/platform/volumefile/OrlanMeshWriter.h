@@ -13,7 +13,8 @@ namespace Kdd
 {
 
 /// Writes a volume file, slice by slice. The file appears under its name when `finish` returns success; until then, and
-/// when the writer goes before, nothing of it is to be seen.
+/// when the writer goes before, nothing of it is to be seen. Used by one thread at a time; several objects may be
+/// used on several threads.
 class KDD_EXPORT OrlanMeshWriter
 {
 public:

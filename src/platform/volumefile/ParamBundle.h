@@ -27,7 +27,8 @@ struct Parameter
     QVector<double> numbers() const;
 };
 
-/// Parameters by name, and further bundles by name below them. A value; copies share what they hold.
+/// Parameters by name, and further bundles by name below them. A value; copies share what they hold. Each thread uses
+/// one of its own.
 class KDD_EXPORT ParamBundle
 {
 public:

@@ -11,7 +11,7 @@ namespace Kdd
 class ParamBundle;
 
 /// The images that a volume file was made from, kept in its bundle "SOPInstanceUIDs": one text for each slice, a SOP
-/// Instance UID, or for frames of a multi-frame image the UID, "." and the frame number.
+/// Instance UID, or for frames of a multi-frame image the UID, "." and the frame number. May be used on any thread.
 class KDD_EXPORT SOPInstanceUtility
 {
 public:

@@ -1,14 +1,15 @@
 #include "kddlib/archive/FileScan.h"
 #include "kddlib/archive/StudyIntake.h"
 #include "tools/kdd/CommandProgress.h"
-#include "tools/kdd/Commands.h"
 #include "tools/kdd/Database.h"
 #include "tools/kdd/Report.h"
+#include "tools/kdd/Selection.h"
 #include "tools/kdd/Store.h"
 
 #include <QJsonArray>
 
 #include <cstdio>
+#include <memory>
 
 namespace Kdd
 {
@@ -68,8 +69,6 @@ void report(const GlobalOptions& options, const FileScan& scan, const StudyIntak
     }
 }
 
-}  // namespace
-
 Outcome runAdd(const GlobalOptions& options, const ScanRequest& request)
 {
     const std::unique_ptr<Kxg::Catalogue> database = openDatabase();
@@ -92,6 +91,24 @@ Outcome runAdd(const GlobalOptions& options, const ScanRequest& request)
     const bool isWhole =
         !toldOfInterrupt(finished.constData()) && scan.refused().empty() && intake.refused().empty();
     return isDone && isWhole ? Outcome::Done : Outcome::Failed;
+}
+
+}  // namespace
+
+void declareAdd(CommandSet& commands)
+{
+    const CommandText text = {
+        "add", kTaking, "Take the DICOM and volume files below the paths into database and tag files",
+        "What a server does when images arrive: every file that is new or changed is registered in the image "
+        "database, and the tag file of each study that gained or lost one is built or completed. Files that "
+        "are neither DICOM nor volume files are passed over; --verbose names them.",
+        "kdd add day                            # a folder\n"
+        "kdd --json add day/*/*                 # counts for a script\n"
+        "kdd add --tolerant day --verbose       # also of damaged files what is sound"};
+    const auto request = std::make_shared<ScanRequest>();
+    ArgumentList arguments =
+        commands.declare(text, [request](const GlobalOptions& options) { return runAdd(options, *request); });
+    request->addTo(arguments);
 }
 
 }  // namespace Kdd

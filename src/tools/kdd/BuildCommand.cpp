@@ -1,17 +1,27 @@
 #include "kddlib/archive/StudyBuilders.h"
 #include "platform/base/LogFile.h"
 #include "tools/kdd/CommandProgress.h"
-#include "tools/kdd/Commands.h"
 #include "tools/kdd/Database.h"
 #include "tools/kdd/Report.h"
+#include "tools/kdd/Selection.h"
 
 #include <cstdio>
+#include <memory>
 
 namespace Kdd
 {
 
 namespace
 {
+
+struct BuildRequest
+{
+    StudySelection selection;   ///< neither studies nor all: what waits to be built
+    bool again = false;         ///< with all: also what has a tag file that nothing changed since
+    bool settle = false;        ///< also what was merged and would wait for its time
+    bool leavesPlaces = false;  ///< attributes stay where they were found
+    int jobs = 1;
+};
 
 void report(const GlobalOptions& options, const BuildTotals& totals)
 {
@@ -25,8 +35,6 @@ void report(const GlobalOptions& options, const BuildTotals& totals)
                     totals.images, totals.volumes, totals.failed);
     }
 }
-
-}  // namespace
 
 Outcome runBuild(const GlobalOptions& options, const BuildRequest& request)
 {
@@ -43,11 +51,34 @@ Outcome runBuild(const GlobalOptions& options, const BuildRequest& request)
         !succeeded(database->countWaiting(expected)))
         return Outcome::Failed;
     CommandProgress progress("Building", !options.quiet);
-    StudyBuilders builders(progress, request.jobs, request.optimize);
+    StudyBuilders builders(progress, request.jobs, !request.leavesPlaces);
     const BuildTotals totals = named.isEmpty() ? builders.buildWaiting(expected) : builders.build(named);
     report(options, totals);
     const QByteArray finished = QByteArray::number(totals.studies) + " studies are built";
     return !toldOfInterrupt(finished.constData()) && totals.failed == 0 ? Outcome::Done : Outcome::Failed;
+}
+
+}  // namespace
+
+void declareBuild(CommandSet& commands)
+{
+    const CommandText text = {
+        "build", kTaking, "Build the tag files of studies that wait for it, or of those named",
+        "Reads all files of a study anew. Without UIDs and --all, what waits is built; --all adds studies "
+        "whose tag file is missing, damaged or not the one that was written last. Several processes share "
+        "the work.",
+        "kdd build                              # what waits\n"
+        "kdd build --all --again --jobs 4       # everything, four studies at once\n"
+        "kdd build 2.25.2062                    # a unique beginning of the UID is enough"};
+    const auto request = std::make_shared<BuildRequest>();
+    ArgumentList arguments = commands.declare(
+        text, [request](const GlobalOptions& options) { return runBuild(options, *request); });
+    request->selection.addTo(arguments);
+    arguments.flag("--again", request->again, "With --all: also those whose files did not change");
+    arguments.flag("--settle", request->settle,
+                   "Also studies that images were merged into lately, without waiting");
+    arguments.flag("--no-optimize", request->leavesPlaces, "Leave every attribute where it was found");
+    arguments.number("--jobs", 1, 256, request->jobs, "Studies built at once");
 }
 
 }  // namespace Kdd

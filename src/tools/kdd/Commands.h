@@ -4,6 +4,13 @@
 #include <QList>
 #include <QString>
 
+#include <functional>
+
+namespace CLI
+{
+class App;
+}
+
 namespace Kdd
 {
 
@@ -21,109 +28,101 @@ struct GlobalOptions
 };
 
 /// How a command ends; the numbers are the exit codes.
+///
+/// With `--json` standard output gets one whole JSON value. A command that fails before it has a result writes nothing
+/// there; one that fails in part writes the result with what failed counted. Reasons go to standard error only.
 enum class Outcome {
     Done = 0,
     Failed = 1,  ///< something asked for was not done, or a fault was found
     WrongUsage = 2,
 };
 
-/// A node of a study: the study, one of its series or one of its images.
-struct NodeSelection
+/// What a value is: shown by the help and the manual, and what the shell completes. Alternatives are separated by "|";
+/// those in small letters are words of their own.
+constexpr const char* kText = "TEXT";
+constexpr const char* kUid = "UID";
+constexpr const char* kStudy = "STUDY";  ///< Study Instance UID, or a unique beginning of it
+constexpr const char* kFile = "FILE";
+constexpr const char* kFolder = "DIR";
+constexpr const char* kPath = "PATH";  ///< file or folder
+constexpr const char* kUrl = "URL";
+constexpr const char* kStudyOrFile = "STUDY|FILE";
+constexpr const char* kStudiesAndFolder = "STUDY|DIR";
+
+struct Argument
 {
-    QByteArray study;  ///< UID or a unique beginning of it
-    QByteArray series;
-    QByteArray image;
+    const char* name;  ///< "--option", or the name of a value that goes without one
+    const char* kind;
+    const char* what;
+    bool isRequired = false;
 };
 
-struct ShowOptions
+/// The arguments of one command. What they are read into has to be there until the command line is parsed.
+class ArgumentList
 {
-    NodeSelection node;
-    bool own = false;   ///< the node's own entries instead of the merged view
-    bool tree = false;  ///< one line for each node instead of attributes
+public:
+    explicit ArgumentList(CLI::App& command)
+        : mCommand(command)
+    {
+    }
+
+    void flag(const char* name, bool& value, const char* what);
+    void number(const char* name, int least, int greatest, int& value, const char* what);
+    void number(const char* name, unsigned& value, const char* what);
+    void text(const Argument& argument, QByteArray& value);
+
+    /// One or more; `shownAs` takes the place of the argument's name in the help where that says more.
+    void texts(const Argument& argument, QList<QByteArray>& values, const char* shownAs = nullptr);
+
+    /// A file's name; std::invalid_argument, while the command line is parsed, when it would lead to another file.
+    void path(const Argument& argument, QString& value);
+
+private:
+    CLI::App& mCommand;
 };
 
-struct StudySelection
+/// How a command presents itself. Help, manual and completion are made from this and from its arguments.
+struct CommandText
 {
-    QList<QByteArray> studies;
-    bool all = false;
+    const char* name;
+    const char* group;    ///< heading under which the help lists it
+    const char* summary;  ///< one line
+    const char* details;  ///< what else a user has to know, as running text
+    const char*
+        examples;  ///< lines "kdd ...   # what for", each one that works on an archive of sample studies
 };
 
-struct BuildRequest
+constexpr const char* kTaking = "Take images in";
+constexpr const char* kChanging = "Change what is stored";
+constexpr const char* kLooking = "Look at what is stored";
+constexpr const char* kChecking = "Check and compare";
+constexpr const char* kTransfers = "Transfer files";
+constexpr const char* kTrying = "Try it out";
+
+/// Where commands declare themselves.
+class CommandSet
 {
-    StudySelection selection;  ///< neither studies nor all: what waits to be built
-    bool again = false;        ///< with all: also what has a tag file that nothing changed since
-    bool settle = false;       ///< also what was merged and would wait for its time
-    bool optimize = true;
-    int jobs = 1;
+public:
+    using Run = std::function<Outcome(const GlobalOptions&)>;
+
+    /// Both outlive this object; `chosen` receives what the command line asks for.
+    CommandSet(CLI::App& app, Run& chosen)
+        : mApp(app)
+        , mChosen(chosen)
+    {
+    }
+
+    ArgumentList declare(const CommandText& text, const Run& run);
+
+private:
+    CLI::App& mApp;
+    Run& mChosen;
 };
 
-struct PreviewsRequest
-{
-    StudySelection selection;
-    QString folder;
-    QString sheet;  ///< file of the contact sheet; empty for none
-};
+/// Declares every command there is.
+void declareCommands(CommandSet& commands);
 
-struct ScanRequest
-{
-    QList<QByteArray> paths;
-    bool tolerant = false;  ///< of damaged DICOM files take what is sound
-};
-
-struct StackRequest
-{
-    StudySelection selection;
-    bool again = false;  ///< also series that have volume files already
-    bool ignoresFrameOfReference = false;
-};
-
-/// Which studies are listed; an empty text lets all pass.
-struct ListRequest
-{
-    QByteArray patient;   ///< part of the name or identifier, whatever the case
-    QByteArray date;      ///< YYYYMMDD, or a range FROM-TO with either end left out
-    QByteArray modality;  ///< one that the study has
-    bool waiting = false;
-};
-
-struct GetRequest
-{
-    QByteArray url;
-    QString file;  ///< or the folder; empty: the URL's own name
-    int parallel = 1;
-};
-
-struct SampleRequest
-{
-    QString folder;
-    int images = 400;
-    unsigned seed = 1;
-};
-
-struct CorrectionRequest
-{
-    QString job;  ///< file of the job's XML
-    QByteArray study;
-    QList<QByteArray> images;
-    QString imageList;  ///< file that names further images, one on each line; empty for none
-};
-
-Outcome runAdd(const GlobalOptions& options, const ScanRequest& request);
-Outcome runIndex(const GlobalOptions& options, const ScanRequest& request);
-Outcome runBuild(const GlobalOptions& options, const BuildRequest& request);
-Outcome runSync(const GlobalOptions& options, const QByteArray& study);
-Outcome runCorrection(const GlobalOptions& options, const CorrectionRequest& request);
-Outcome runStack(const GlobalOptions& options, const StackRequest& request);
-Outcome runPreviews(const GlobalOptions& options, const PreviewsRequest& request);
-Outcome runList(const GlobalOptions& options, const ListRequest& request);
-Outcome runShow(const GlobalOptions& options, const ShowOptions& show);
-Outcome runMetadata(const GlobalOptions& options, const NodeSelection& selection);
-Outcome runStat(const GlobalOptions& options, const QByteArray& study);
-Outcome runDiff(const GlobalOptions& options, const QString& left, const QString& right);
-Outcome runVerify(const GlobalOptions& options, const StudySelection& selection);
-Outcome runDelete(const GlobalOptions& options, const NodeSelection& selection);
-Outcome runGet(const GlobalOptions& options, const GetRequest& request);
-Outcome runPut(const GlobalOptions& options, const QString& path, const QByteArray& url);
-Outcome runSample(const GlobalOptions& options, const SampleRequest& request);
+/// As the locale has it. std::invalid_argument when it is no text there and would lead to another file.
+QString pathOf(const QByteArray& text);
 
 }  // namespace Kdd

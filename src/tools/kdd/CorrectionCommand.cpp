@@ -11,12 +11,21 @@
 #include <QFile>
 
 #include <cstdio>
+#include <memory>
 
 namespace Kdd
 {
 
 namespace
 {
+
+struct CorrectionRequest
+{
+    QString job;  ///< file of the job's XML
+    QByteArray study;
+    QList<QByteArray> images;
+    QString imageList;  ///< file that names further images, one on each line; empty for none
+};
 
 constexpr qint64 kMaxImageList = 64 * 1024 * 1024;
 
@@ -97,8 +106,6 @@ void report(const GlobalOptions& options, const QAData& job)
     }
 }
 
-}  // namespace
-
 Outcome runCorrection(const GlobalOptions& options, const CorrectionRequest& request)
 {
     if (request.images.isEmpty() && request.imageList.isEmpty()) {
@@ -112,6 +119,28 @@ Outcome runCorrection(const GlobalOptions& options, const CorrectionRequest& req
         return Outcome::Failed;
     report(options, job);
     return job.outcome.notFound.isEmpty() ? Outcome::Done : Outcome::Failed;
+}
+
+}  // namespace
+
+void declareCorrection(CommandSet& commands)
+{
+    const CommandText text = {
+        "qa", kChanging, "Correct attributes of images, or move images to another study",
+        "The job is done for all its images or for none. It is kept in the database, so that every later "
+        "build makes it again, and told in each image's audit log. The DICOM files stay as they are.",
+        "kdd qa job.xml --study 2.25.2062 --images images.txt\n"
+        "kdd qa job.xml --study 2.25.2062 --image 2.25.118095209191961083373906363074726608325"};
+    const auto request = std::make_shared<CorrectionRequest>();
+    ArgumentList arguments = commands.declare(
+        text, [request](const GlobalOptions& options) { return runCorrection(options, *request); });
+    arguments.path({"JOB", kFile, "XML file that says what to correct", true}, request->job);
+    arguments.text({"--study", kStudy,
+                    "Study Instance UID, or a unique beginning of it; of a move all of the new study's",
+                    true},
+                   request->study);
+    arguments.texts({"--image", kUid, "SOP Instance UIDs"}, request->images);
+    arguments.path({"--images", kFile, "File of SOP Instance UIDs, one on each line"}, request->imageList);
 }
 
 }  // namespace Kdd

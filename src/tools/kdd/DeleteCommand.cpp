@@ -1,10 +1,13 @@
 #include "kddlib/archive/StudyChange.h"
-#include "tools/kdd/Commands.h"
 #include "tools/kdd/Database.h"
 #include "tools/kdd/Report.h"
+#include "tools/kdd/Selection.h"
 #include "tools/kdd/Store.h"
 
 namespace Kdd
+{
+
+namespace
 {
 
 Outcome runDelete(const GlobalOptions& options, const NodeSelection& selection)
@@ -17,6 +20,21 @@ Outcome runDelete(const GlobalOptions& options, const NodeSelection& selection)
     if (options.json)
         printJson({{QStringLiteral("deleted"), 1}});
     return Outcome::Done;
+}
+
+}  // namespace
+
+void declareDelete(CommandSet& commands)
+{
+    const CommandText text = {"delete", kChanging, "Delete a study's tag file, a series or an image",
+                              "The database forgets the images and the tag file loses them. The DICOM files "
+                              "stay where they are; adding them again brings the images back.",
+                              "kdd delete 2.25.2062 --image 2.25.118095209191961083373906363074726608325\n"
+                              "kdd delete 2.25.2062                   # the whole study"};
+    const auto request = std::make_shared<NodeSelection>();
+    ArgumentList arguments = commands.declare(
+        text, [request](const GlobalOptions& options) { return runDelete(options, *request); });
+    request->addTo(arguments);
 }
 
 }  // namespace Kdd

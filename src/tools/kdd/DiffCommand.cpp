@@ -10,12 +10,19 @@
 #include <QJsonArray>
 
 #include <cstdio>
+#include <memory>
 
 namespace Kdd
 {
 
 namespace
 {
+
+struct DiffRequest
+{
+    QString left;
+    QString right;
+};
 
 constexpr char kTagFileMagic[] = "TaCa";
 
@@ -105,8 +112,6 @@ private:
     int mCount = 0;
 };
 
-}  // namespace
-
 Outcome runDiff(const GlobalOptions& options, const QString& left, const QString& right)
 {
     TagFile leftFile;
@@ -116,6 +121,24 @@ Outcome runDiff(const GlobalOptions& options, const QString& left, const QString
     Comparison comparison(options);
     comparison.compare(leftFile, rightFile);
     return comparison.report();
+}
+
+}  // namespace
+
+void declareDiff(CommandSet& commands)
+{
+    const CommandText text = {
+        "diff", kChecking, "Compare two studies or files attribute by attribute",
+        "Either side is a study of the archive, a tag file or a DICOM file. Images are compared that bear "
+        "the same UID; two single images in any case. The exit code is 1 when there is a difference.",
+        "kdd diff 2.25.2062 2.25.2062\n"
+        "kdd diff 2.25.2062 copy.tc             # a tag file, as of a backup"};
+    const auto request = std::make_shared<DiffRequest>();
+    ArgumentList arguments = commands.declare(text, [request](const GlobalOptions& options) {
+        return runDiff(options, request->left, request->right);
+    });
+    arguments.path({"LEFT", kStudyOrFile, "Study UID, tag file or DICOM file", true}, request->left);
+    arguments.path({"RIGHT", kStudyOrFile, "Study UID, tag file or DICOM file", true}, request->right);
 }
 
 }  // namespace Kdd

@@ -19,6 +19,13 @@ namespace Kdd
 namespace
 {
 
+struct GetRequest
+{
+    QByteArray url;
+    QString file;  ///< or the folder; empty: the URL's own name
+    int parallel = 4;
+};
+
 constexpr std::size_t kBlock = 4 * 1024 * 1024;  // [bytes]
 
 /// Longer ranges leave connections idle at the end of an object, shorter ones spend more time on asking.
@@ -181,8 +188,6 @@ void report(const GlobalOptions& options, const GetRequest& request, const QStri
         std::printf("%s\n", qUtf8Printable(line));
 }
 
-}  // namespace
-
 Outcome runGet(const GlobalOptions& options, const GetRequest& request)
 {
     if (!KxCurlClient::isUrl(request.url.constData())) {
@@ -210,6 +215,24 @@ Outcome runGet(const GlobalOptions& options, const GetRequest& request)
         return Outcome::Failed;
     report(options, request, target, bytes, fetch.resumedAt());
     return Outcome::Done;
+}
+
+}  // namespace
+
+void declareGet(CommandSet& commands)
+{
+    const CommandText text = {"get", kTransfers, "Fetch an object over HTTP(S) or from the cloud storage",
+                              "The file bears its name only when it is complete. A run that breaks off "
+                              "leaves FILE.part, and the same command goes on from there.",
+                              "kdd get https://host/a.dcm --parallel 8\n"
+                              "kdd get gs://bucket/a.dcm -o copies"};
+    const auto request = std::make_shared<GetRequest>();
+    ArgumentList arguments =
+        commands.declare(text, [request](const GlobalOptions& options) { return runGet(options, *request); });
+    arguments.text({"URL", kUrl, "http://, https:// or gs://", true}, request->url);
+    arguments.path({"-o,--output", kPath, "File or folder to write to (default: the URL's own name)"},
+                   request->file);
+    arguments.number("--parallel", 1, 64, request->parallel, "Ranges fetched at a time");
 }
 
 }  // namespace Kdd

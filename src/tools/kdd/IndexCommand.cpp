@@ -2,14 +2,18 @@
 #include "kddlib/archive/Registration.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "tools/kdd/CommandProgress.h"
-#include "tools/kdd/Commands.h"
 #include "tools/kdd/Database.h"
 #include "tools/kdd/Report.h"
+#include "tools/kdd/Selection.h"
 #include "tools/kdd/Store.h"
 
 #include <cstdio>
+#include <memory>
 
 namespace Kdd
+{
+
+namespace
 {
 
 Outcome runIndex(const GlobalOptions& options, const ScanRequest& request)
@@ -47,6 +51,22 @@ Outcome runIndex(const GlobalOptions& options, const ScanRequest& request)
     }
     const QByteArray finished = QByteArray::number(registration.images()) + " images are registered";
     return !toldOfInterrupt(finished.constData()) && isDone && failed == 0 ? Outcome::Done : Outcome::Failed;
+}
+
+}  // namespace
+
+void declareIndex(CommandSet& commands)
+{
+    const CommandText text = {"index", kTaking,
+                              "Register the DICOM and volume files below the paths in the database only",
+                              "The studies then wait to be built, by `kdd build` in as many processes and on "
+                              "as many machines as you like. For an archive that is there already.",
+                              "kdd index day\n"
+                              "kdd build --all --jobs 4               # then this builds what waits"};
+    const auto request = std::make_shared<ScanRequest>();
+    ArgumentList arguments = commands.declare(
+        text, [request](const GlobalOptions& options) { return runIndex(options, *request); });
+    request->addTo(arguments);
 }
 
 }  // namespace Kdd

@@ -9,12 +9,22 @@
 #include <QJsonArray>
 
 #include <cstdio>
+#include <memory>
 
 namespace Kdd
 {
 
 namespace
 {
+
+/// Which studies are listed; an empty text lets all pass.
+struct ListRequest
+{
+    QByteArray patient;   ///< part of the name or identifier, whatever the case
+    QByteArray date;      ///< YYYYMMDD, or a range FROM-TO with either end left out
+    QByteArray modality;  ///< one that the study has
+    bool waiting = false;
+};
 
 struct ListedStudy
 {
@@ -112,8 +122,6 @@ bool passes(const Kxg::StudySummary& study, const ListRequest& request)
            (!request.waiting || study.isWaiting);
 }
 
-}  // namespace
-
 Outcome runList(const GlobalOptions& options, const ListRequest& request)
 {
     DateRange dates;
@@ -135,6 +143,27 @@ Outcome runList(const GlobalOptions& options, const ListRequest& request)
     else
         printList(studies);
     return Outcome::Done;
+}
+
+}  // namespace
+
+void declareList(CommandSet& commands)
+{
+    const CommandText text = {"list", kLooking, "List the studies",
+                              "Patient, date, modalities, counts and the size of the tag file, as the "
+                              "database knows them, corrections included.",
+                              "kdd list\n"
+                              "kdd list --modality MR --date 20240101-\n"
+                              "kdd --json list --waiting              # what `kdd build` would build"};
+    const auto request = std::make_shared<ListRequest>();
+    ArgumentList arguments = commands.declare(
+        text, [request](const GlobalOptions& options) { return runList(options, *request); });
+    arguments.text({"--patient", kText, "Only those whose patient's name or identifier has this in it"},
+                   request->patient);
+    arguments.text({"--date", "DATE", "Only those of this date, YYYYMMDD, or of a range FROM-TO"},
+                   request->date);
+    arguments.text({"--modality", kText, "Only those with a series of this modality"}, request->modality);
+    arguments.flag("--waiting", request->waiting, "Only those that wait to be built");
 }
 
 }  // namespace Kdd

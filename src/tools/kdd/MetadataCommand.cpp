@@ -1,7 +1,7 @@
 #include "kddlib/items/DicomJson.h"
 #include "kddlib/tagmodel/TagMap.h"
-#include "tools/kdd/Commands.h"
 #include "tools/kdd/NodeLookup.h"
+#include "tools/kdd/Selection.h"
 
 #include <iostream>
 
@@ -11,14 +11,6 @@ namespace Kdd
 namespace
 {
 
-/// Where a web service would offer what the image's metadata leaves out.
-std::string bulkDataRoot(const TagMap& image)
-{
-    return "studies/" + image.uid(TagMap::StudyLevel).toStdString() + "/series/" +
-           image.uid(TagMap::SeriesLevel).toStdString() + "/instances/" +
-           image.uid(TagMap::ImageLevel).toStdString() + "/bulkdata";
-}
-
 void collectImages(const TagMap& node, QList<const TagMap*>& images)
 {
     if (depthOf(node) == 2)
@@ -26,8 +18,6 @@ void collectImages(const TagMap& node, QList<const TagMap*>& images)
     for (const TagMap* child : node.children())
         collectImages(*child, images);
 }
-
-}  // namespace
 
 Outcome runMetadata(const GlobalOptions& /*options*/, const NodeSelection& selection)
 {
@@ -45,6 +35,22 @@ Outcome runMetadata(const GlobalOptions& /*options*/, const NodeSelection& selec
     }
     std::cout << (images.isEmpty() ? "[]\n" : "\n]\n") << std::flush;
     return Outcome::Done;
+}
+
+}  // namespace
+
+void declareMetadata(CommandSet& commands)
+{
+    const CommandText text = {
+        "metadata", kLooking, "Write images as DICOM JSON",
+        "An array with one object for each image, in UTF-8, with or without --json; inherited values are "
+        "included. A value that the tag file leaves out is {\"vr\": ..., \"BulkDataURI\": ...}.",
+        "kdd metadata 2.25.2062 > metadata.json\n"
+        "kdd metadata 2.25.2062 --image 2.25.118095209191961083373906363074726608325"};
+    const auto request = std::make_shared<NodeSelection>();
+    ArgumentList arguments = commands.declare(
+        text, [request](const GlobalOptions& options) { return runMetadata(options, *request); });
+    request->addTo(arguments);
 }
 
 }  // namespace Kdd

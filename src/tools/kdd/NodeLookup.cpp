@@ -36,4 +36,15 @@ int depthOf(const TagMap& node)
     return depth;
 }
 
+std::string bulkDataRoot(const TagMap& node)
+{
+    const int depth = depthOf(node);
+    std::string root = "studies/" + node.uid(TagMap::StudyLevel).toStdString();
+    if (depth > 0)
+        root += "/series/" + node.uid(TagMap::SeriesLevel).toStdString();
+    if (depth > 1)
+        root += "/instances/" + node.uid(TagMap::ImageLevel).toStdString();
+    return root + "/bulkdata";
+}
+
 }  // namespace Kdd

@@ -1,7 +1,7 @@
 #pragma once
 
 #include "kddlib/tagfile/TagFile.h"
-#include "tools/kdd/Commands.h"
+#include "tools/kdd/Selection.h"
 
 namespace Kdd
 {
@@ -12,5 +12,8 @@ TagMap* findNode(const NodeSelection& selection, TagFile& file);
 
 /// 0 for a study, 1 for a series, 2 for an image.
 int depthOf(const TagMap& node);
+
+/// Where a web service would offer what the node's metadata leaves out.
+std::string bulkDataRoot(const TagMap& node);
 
 }  // namespace Kdd

@@ -8,13 +8,26 @@
 #include <QDir>
 
 #include <cstdio>
+#include <memory>
 
 namespace Kdd
 {
 
+namespace
+{
+
+struct PreviewsRequest
+{
+    QList<QByteArray> names;  ///< the studies, and last the folder
+    bool all = false;
+    QString sheet;  ///< file of the contact sheet; empty for none
+};
+
 Outcome runPreviews(const GlobalOptions& options, const PreviewsRequest& request)
 {
-    if (request.selection.all != request.selection.studies.isEmpty()) {
+    QList<QByteArray> named = request.names;
+    const QString folder = pathOf(named.takeLast());
+    if (request.all != named.isEmpty()) {
         LogFile::errorf("Name the studies whose previews to export, or --all");
         return Outcome::WrongUsage;
     }
@@ -22,29 +35,47 @@ Outcome runPreviews(const GlobalOptions& options, const PreviewsRequest& request
     QVector<QByteArray> studyUIDs;
     if (database == nullptr)
         return Outcome::Failed;
-    if (!QDir().mkpath(request.folder)) {
-        LogFile::errorf("Could not create folder %s", qUtf8Printable(request.folder));
+    if (!QDir().mkpath(folder)) {
+        LogFile::errorf("Could not create folder %s", qUtf8Printable(folder));
         return Outcome::Failed;
     }
-    bool isDone = chooseStudies(*database, request.selection.studies, request.selection.all, studyUIDs);
+    bool isDone = chooseStudies(*database, named, request.all, studyUIDs);
     int exported = 0;
     for (const QByteArray& studyUID : qAsConst(studyUIDs)) {
         TagFile file;
         if (readStudyFile(studyUID, file))
-            exported += file.exportPreviews(request.folder);
+            exported += file.exportPreviews(folder);
         else
             isDone = false;
     }
     if (!request.sheet.isEmpty()) {
-        const Result result = writeContactSheet(request.folder, request.sheet);
+        const Result result = writeContactSheet(folder, request.sheet);
         isDone = succeeded(result) && isDone;
     }
     if (options.json)
         printJson({{QStringLiteral("previews"), exported}});
     else if (!options.quiet)
-        std::printf("%d previews of %d studies in %s\n", exported, studyUIDs.size(),
-                    qUtf8Printable(request.folder));
+        std::printf("%d previews of %d studies in %s\n", exported, studyUIDs.size(), qUtf8Printable(folder));
     return isDone ? Outcome::Done : Outcome::Failed;
+}
+
+}  // namespace
+
+void declarePreviews(CommandSet& commands)
+{
+    const CommandText text = {"previews", kLooking, "Export the previews of studies",
+                              "One JPEG file for each image that has a preview, in the folder named last, "
+                              "which is made when it is not there.",
+                              "kdd previews --all pictures --sheet all.png\n"
+                              "kdd previews 2.25.2062 pictures"};
+    const auto request = std::make_shared<PreviewsRequest>();
+    ArgumentList arguments = commands.declare(
+        text, [request](const GlobalOptions& options) { return runPreviews(options, *request); });
+    arguments.texts({"NAMES", kStudiesAndFolder, "The studies, and last the folder to write to", true},
+                    request->names, "UID... DIR");
+    arguments.flag("--all", request->all, "Every study; then name the folder only");
+    arguments.path({"--sheet", kFile, "Also put all pictures of the folder into this one picture"},
+                   request->sheet);
 }
 
 }  // namespace Kdd

@@ -10,6 +10,7 @@
 #include <QFile>
 
 #include <cstdio>
+#include <memory>
 #include <stdexcept>
 
 namespace Kdd
@@ -17,6 +18,12 @@ namespace Kdd
 
 namespace
 {
+
+struct PutRequest
+{
+    QString file;
+    QByteArray url;
+};
 
 constexpr int kBlockSize = 1024 * 1024;  // [bytes]
 
@@ -50,8 +57,6 @@ Result upload(QFile& file, const QByteArray& url, Progress& progress)
     }
 }
 
-}  // namespace
-
 Outcome runPut(const GlobalOptions& options, const QString& path, const QByteArray& url)
 {
     QFile file(path);
@@ -75,6 +80,22 @@ Outcome runPut(const GlobalOptions& options, const QString& path, const QByteArr
     else if (!options.quiet)
         std::printf("%s: %s\n", url.constData(), qUtf8Printable(humanBytes(file.pos())));
     return Outcome::Done;
+}
+
+}  // namespace
+
+void declarePut(CommandSet& commands)
+{
+    const CommandText text = {"put", kTransfers, "Upload a file to the cloud storage",
+                              "The object is there when all of it is. An upload that breaks off is resumed; "
+                              "when it fails there is no object.",
+                              "kdd put scan.dcm gs://bucket/scan.dcm"};
+    const auto request = std::make_shared<PutRequest>();
+    ArgumentList arguments = commands.declare(text, [request](const GlobalOptions& options) {
+        return runPut(options, request->file, request->url);
+    });
+    arguments.path({"FILE", kFile, "What to upload", true}, request->file);
+    arguments.text({"URL", kUrl, "gs://BUCKET/OBJECT", true}, request->url);
 }
 
 }  // namespace Kdd

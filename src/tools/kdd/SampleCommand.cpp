@@ -6,9 +6,20 @@
 #include "tools/kdd/SampleVolumes.h"
 
 #include <cstdio>
+#include <memory>
 
 namespace Kdd
 {
+
+namespace
+{
+
+struct SampleRequest
+{
+    QString folder;
+    int images = 400;
+    unsigned seed = 1;
+};
 
 Outcome runSample(const GlobalOptions& options, const SampleRequest& request)
 {
@@ -36,6 +47,23 @@ Outcome runSample(const GlobalOptions& options, const SampleRequest& request)
                     qUtf8Printable(request.folder));
     }
     return Outcome::Done;
+}
+
+}  // namespace
+
+void declareSample(CommandSet& commands)
+{
+    const CommandText text = {"sample", kTrying, "Write synthetic studies",
+                              "A small hospital day: CT, MR, ultrasound, mammograms, X-ray and documents, "
+                              "with several character sets. The same number and seed give the same studies.",
+                              "kdd sample day --images 600\n"
+                              "kdd sample other-day --seed 2"};
+    const auto request = std::make_shared<SampleRequest>();
+    ArgumentList arguments = commands.declare(
+        text, [request](const GlobalOptions& options) { return runSample(options, *request); });
+    arguments.path({"DIR", kFolder, "Folder to write to", true}, request->folder);
+    arguments.number("--images", 1, 10000000, request->images, "About how many images in all");
+    arguments.number("--seed", request->seed, "Another seed gives other studies");
 }
 
 }  // namespace Kdd

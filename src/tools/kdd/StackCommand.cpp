@@ -1,18 +1,26 @@
 #include "kddlib/archive/StudyStacker.h"
 #include "tools/kdd/CommandProgress.h"
-#include "tools/kdd/Commands.h"
 #include "tools/kdd/Database.h"
 #include "tools/kdd/Report.h"
+#include "tools/kdd/Selection.h"
 
 #include <QJsonArray>
 
 #include <cstdio>
+#include <memory>
 
 namespace Kdd
 {
 
 namespace
 {
+
+struct StackRequest
+{
+    StudySelection selection;
+    bool again = false;  ///< also series that have volume files already
+    bool ignoresFrameOfReference = false;
+};
 
 QJsonObject jsonOf(const StackedSeries& series)
 {
@@ -34,8 +42,6 @@ void print(const StackedSeries& series)
     for (auto it = series.reasons.cbegin(); it != series.reasons.cend(); ++it)
         std::printf("    %d left out: %s\n", it.value(), qUtf8Printable(it.key()));
 }
-
-}  // namespace
 
 Outcome runStack(const GlobalOptions& options, const StackRequest& request)
 {
@@ -70,6 +76,25 @@ Outcome runStack(const GlobalOptions& options, const StackRequest& request)
         std::printf("%d volumes made\n", volumes);
     const QByteArray finished = QByteArray::number(studies) + " studies are stacked";
     return !toldOfInterrupt(finished.constData()) && isDone ? Outcome::Done : Outcome::Failed;
+}
+
+}  // namespace
+
+void declareStack(CommandSet& commands)
+{
+    const CommandText text = {
+        "stack", kTaking, "Make volume files from the series that can be stacked",
+        "The volume files stand in the store and are registered. Without UIDs every study is looked at. Of "
+        "each series that gives no volume, or leaves images out, the reason is told.",
+        "kdd stack                              # every study\n"
+        "kdd stack 2.25.2062 --again            # anew what has volumes already"};
+    const auto request = std::make_shared<StackRequest>();
+    ArgumentList arguments = commands.declare(
+        text, [request](const GlobalOptions& options) { return runStack(options, *request); });
+    request->selection.addTo(arguments);
+    arguments.flag("--again", request->again, "Also series that have volume files already");
+    arguments.flag("--ignore-frame-of-reference", request->ignoresFrameOfReference,
+                   "Also stack slices that have different Frames of Reference, as anonymisers leave them");
 }
 
 }  // namespace Kdd

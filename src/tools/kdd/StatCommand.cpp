@@ -1,12 +1,16 @@
-#include "tools/kdd/Commands.h"
 #include "tools/kdd/Report.h"
+#include "tools/kdd/Selection.h"
 #include "tools/kdd/Store.h"
 
 #include <QFileInfo>
 
 #include <cstdio>
+#include <memory>
 
 namespace Kdd
+{
+
+namespace
 {
 
 Outcome runStat(const GlobalOptions& options, const QByteArray& study)
@@ -41,6 +45,18 @@ Outcome runStat(const GlobalOptions& options, const QByteArray& study)
             std::printf("%-16s %lld\n", row.name, static_cast<long long>(row.value));
     }
     return Outcome::Done;
+}
+
+}  // namespace
+
+void declareStat(CommandSet& commands)
+{
+    const CommandText text = {"stat", kLooking, "Show counters and sizes of a study's tag file",
+                              "Sizes are in bytes, times in milliseconds.", "kdd stat 2.25.2062"};
+    const auto request = std::make_shared<QByteArray>();
+    ArgumentList arguments = commands.declare(
+        text, [request](const GlobalOptions& options) { return runStat(options, *request); });
+    arguments.text(kOneStudy, *request);
 }
 
 }  // namespace Kdd

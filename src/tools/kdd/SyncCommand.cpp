@@ -1,13 +1,17 @@
 #include "kddlib/archive/StudyChange.h"
 #include "kddlib/tagfile/TagFile.h"
-#include "tools/kdd/Commands.h"
 #include "tools/kdd/Database.h"
 #include "tools/kdd/Report.h"
+#include "tools/kdd/Selection.h"
 #include "tools/kdd/Store.h"
 
 #include <cstdio>
+#include <memory>
 
 namespace Kdd
+{
+
+namespace
 {
 
 Outcome runSync(const GlobalOptions& options, const QByteArray& study)
@@ -27,6 +31,20 @@ Outcome runSync(const GlobalOptions& options, const QByteArray& study)
                     statistics.images);
     }
     return Outcome::Done;
+}
+
+}  // namespace
+
+void declareSync(CommandSet& commands)
+{
+    const CommandText text = {
+        "sync", kChanging, "Bring a study's tag file into line with the database",
+        "Paths, names and series become those of the database. No DICOM file is opened.",
+        "kdd sync 2.25.2062"};
+    const auto request = std::make_shared<QByteArray>();
+    ArgumentList arguments = commands.declare(
+        text, [request](const GlobalOptions& options) { return runSync(options, *request); });
+    arguments.text(kOneStudy, *request);
 }
 
 }  // namespace Kdd

@@ -1,14 +1,18 @@
 #include "kddlib/archive/StudyCheck.h"
 #include "platform/base/LogFile.h"
 #include "tools/kdd/CommandProgress.h"
-#include "tools/kdd/Commands.h"
 #include "tools/kdd/Database.h"
 #include "tools/kdd/Report.h"
+#include "tools/kdd/Selection.h"
 #include "tools/kdd/Store.h"
 
 #include <cstdio>
+#include <memory>
 
 namespace Kdd
+{
+
+namespace
 {
 
 Outcome runVerify(const GlobalOptions& options, const StudySelection& selection)
@@ -44,6 +48,23 @@ Outcome runVerify(const GlobalOptions& options, const StudySelection& selection)
     const QByteArray finished = QByteArray::number(findings.studies) + " studies are verified";
     isDone = !toldOfInterrupt(finished.constData()) && isDone;
     return isDone && findings.differences == 0 && findings.unreadable == 0 ? Outcome::Done : Outcome::Failed;
+}
+
+}  // namespace
+
+void declareVerify(CommandSet& commands)
+{
+    const CommandText text = {"verify", kChecking,
+                              "Hold tag files against the DICOM files they were made from",
+                              "Every attribute of every image is compared, corrections taken into account, "
+                              "and the tag files are held against the database. Nothing is changed. Each "
+                              "difference is named; the exit code is 1 when there is one.",
+                              "kdd verify --all\n"
+                              "kdd --json verify 2.25.2062            # counts for a script"};
+    const auto request = std::make_shared<StudySelection>();
+    ArgumentList arguments = commands.declare(
+        text, [request](const GlobalOptions& options) { return runVerify(options, *request); });
+    request->addTo(arguments);
 }
 
 }  // namespace Kdd

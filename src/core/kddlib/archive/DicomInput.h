@@ -20,7 +20,7 @@ struct RefusedFile
     QString reason;
 };
 
-/// What became of one file that was offered.
+/// What became of one file that was offered. Used by one thread at a time, also by another one than read it.
 struct KDD_EXPORT DicomInput
 {
     enum class Kind {

@@ -13,7 +13,8 @@ namespace Kdd
 {
 
 /// Looks through files and folders for what the catalogue does not know yet, or knows otherwise: files whose path, size
-/// and time of change are known are not opened. The archive's own files are passed over.
+/// and time of change are known are not opened. The archive's own files are passed over. Used by the thread of its
+/// catalogue.
 class KDD_EXPORT FileScan
 {
 public:

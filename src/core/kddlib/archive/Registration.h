@@ -9,7 +9,8 @@ namespace Kdd
 struct DicomInput;
 
 /// Registers files in batches: one transaction for each file would make the database the slowest part by far. Files that
-/// stand in each other's way, and those that a correction leads elsewhere, are warned about by name.
+/// stand in each other's way, and those that a correction leads elsewhere, are warned about by name. Used by the
+/// thread of its catalogue.
 class KDD_EXPORT Registration
 {
 public:

@@ -21,7 +21,7 @@ struct ArchiveNode
 };
 
 /// Changes of what the archive holds: removals, corrections, bringing a tag file into line with the database. Each waits
-/// for whoever works on the study, and goes through to its end under one claim.
+/// for whoever works on the study, and goes through to its end under one claim. Used by the thread of its catalogue.
 class KDD_EXPORT StudyChange
 {
 public:

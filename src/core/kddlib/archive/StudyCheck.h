@@ -28,7 +28,8 @@ struct CheckFindings
 
 /// Holds tag files against the DICOM files they were made from, attribute by attribute, and against the catalogue: a
 /// study without tag file, a tag file that is not the one written last, images and volumes too many or too few, previews
-/// that are cut off, images that are not where a correction put them. Changes nothing.
+/// that are cut off, images that are not where a correction put them. Changes nothing. Used by the thread of its
+/// catalogue.
 class KDD_EXPORT StudyCheck
 {
 public:

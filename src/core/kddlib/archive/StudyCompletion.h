@@ -30,7 +30,7 @@ struct CompletedStudy
 /// - else the tag file is built from all files of the study.
 ///
 /// A file that was removed by hand, restored from a backup or written by others is thus never taken for what the
-/// catalogue believes it to be.
+/// catalogue believes it to be. Used by the thread of its catalogue.
 class KDD_EXPORT StudyCompletion
 {
 public:

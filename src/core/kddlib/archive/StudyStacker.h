@@ -32,7 +32,8 @@ struct StackOptions
     FrameOfReference reference = FrameOfReference::Shared;
 };
 
-/// Makes volume files from the series of a study that can be stacked, registers them and completes the study.
+/// Makes volume files from the series of a study that can be stacked, registers them and completes the study. Used by
+/// the thread of its catalogue.
 class KDD_EXPORT StudyStacker
 {
 public:

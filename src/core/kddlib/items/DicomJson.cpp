@@ -48,8 +48,11 @@ std::unique_ptr<DcmDataset> utf8Dataset(const TagMap& map)
 class JsonWriter
 {
 public:
-    explicit JsonWriter(std::ostream& out)
+    enum class Entries { Merged, Own };
+
+    JsonWriter(std::ostream& out, Entries entries)
         : mOut(out)
+        , mEntries(entries)
         , mFormat(OFFalse)
     {
     }
@@ -64,8 +67,8 @@ public:
              next = item.nextInContainer(next)) {
             const DcmTagKey key(next->getGTag(), next->getETag());
             for (; source != end && source.key() < key; ++source)
-                omitted(source, address, isFirst);
-            if (!isWritten(key))
+                omitted(map, source, address, isFirst);
+            if (!isWanted(map, key))
                 continue;
             const bool isFromMap = source != end && source.key() == key;
             separate(isFirst);
@@ -78,7 +81,7 @@ public:
                 ++source;
         }
         for (; source != end; ++source)
-            omitted(source, address, isFirst);
+            omitted(map, source, address, isFirst);
         mOut << '}';
     }
 
@@ -89,6 +92,11 @@ private:
             .toStdString();
     }
 
+    bool isWanted(const TagMap& map, const DcmTagKey& key) const
+    {
+        return isWritten(key) && (mEntries == Entries::Merged || map.tagsForLevel().contains(key));
+    }
+
     void separate(bool& isFirst)
     {
         if (!isFirst)
@@ -96,9 +104,9 @@ private:
         isFirst = false;
     }
 
-    void omitted(const TagMap::iterator& source, const std::string& address, bool& isFirst)
+    void omitted(const TagMap& map, const TagMap::iterator& source, const std::string& address, bool& isFirst)
     {
-        if (!source.value()->markedAsOmitted() || !isWritten(source.key()))
+        if (!source.value()->markedAsOmitted() || !isWanted(map, source.key()))
             return;
         separate(isFirst);
         const std::string key = name(source.key());
@@ -122,6 +130,7 @@ private:
     }
 
     std::ostream& mOut;
+    Entries mEntries;
     DcmJsonFormatCompact mFormat;
 };
 
@@ -130,7 +139,13 @@ private:
 void writeDicomJson(std::ostream& out, const TagMap& map, const std::string& bulkDataRoot)
 {
     const std::unique_ptr<DcmDataset> dataset = utf8Dataset(map);
-    JsonWriter(out).object(*dataset, map, bulkDataRoot);
+    JsonWriter(out, JsonWriter::Entries::Merged).object(*dataset, map, bulkDataRoot);
+}
+
+void writeOwnDicomJson(std::ostream& out, const TagMap& map, const std::string& bulkDataRoot)
+{
+    const std::unique_ptr<DcmDataset> dataset = utf8Dataset(map);
+    JsonWriter(out, JsonWriter::Entries::Own).object(*dataset, map, bulkDataRoot);
 }
 
 }  // namespace Kdd

@@ -18,4 +18,9 @@ class TagMap;
 /// ("root/00409096/0/00281051"). Texts that their character set cannot explain are decoded as `decodeText` does.
 KDD_EXPORT void writeDicomJson(std::ostream& out, const TagMap& map, const std::string& bulkDataRoot);
 
+/// The same of the node's own entries only, and in sequences of the items' own. Markers that hide an inherited value
+/// have no form in JSON and are left out; texts are decoded by the character set that the node shows, also where it
+/// inherits that.
+KDD_EXPORT void writeOwnDicomJson(std::ostream& out, const TagMap& map, const std::string& bulkDataRoot);
+
 }  // namespace Kdd

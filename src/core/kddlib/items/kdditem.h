@@ -20,7 +20,7 @@ namespace Kdd
 
 class Item;
 
-/// The items of a sequence attribute, wherever they come from.
+/// The items of a sequence attribute, wherever they come from. Used by one thread at a time.
 class KDD_EXPORT SequenceOfItems
 {
 public:

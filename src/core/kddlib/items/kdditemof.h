@@ -11,7 +11,8 @@ namespace Kdd
 
 class SequenceOfItemsOF;
 
-/// An item of a DCMTK dataset, or a whole one. Answers are DCMTK's own unless said otherwise here.
+/// An item of a DCMTK dataset, or a whole one. Answers are DCMTK's own unless said otherwise here. Used by one thread
+/// at a time.
 class KDD_EXPORT ItemOF : public Item
 {
 public:
@@ -61,7 +62,7 @@ private:
     std::vector<std::shared_ptr<SequenceOfItemsOF>> mSequences;
 };
 
-/// The items of a DCMTK sequence, which must outlive this object and keep its items.
+/// The items of a DCMTK sequence, which must outlive this object and keep its items. Used by one thread at a time.
 class KDD_EXPORT SequenceOfItemsOF : public SequenceOfItems
 {
 public:

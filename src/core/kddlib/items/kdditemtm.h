@@ -19,7 +19,7 @@ class TagSequence;
 /// `TagElement::getValueAsString`, shortened when they are long. Arrays and `findAndGetUint16` read the value's bytes
 /// whatever its value representation. Where the dataset's condition for an empty number is an error, texts and arrays
 /// are just empty. An attribute that the cache knows of without keeping its value is there with an empty value, be it
-/// a sequence or not; the dataset has it.
+/// a sequence or not; the dataset has it. Used by one thread at a time.
 class KDD_EXPORT ItemTM : public Item
 {
 public:
@@ -80,7 +80,7 @@ private:
     std::shared_ptr<DcmDataset> mDataset;
 };
 
-/// The items of a sequence in the cache.
+/// The items of a sequence in the cache. Used by one thread at a time.
 class KDD_EXPORT SequenceOfItemsTM : public SequenceOfItems
 {
 public:

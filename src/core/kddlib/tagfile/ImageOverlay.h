@@ -15,7 +15,8 @@ namespace Kdd
 /// are not there any more. The audit log, which tells of all corrections so far, is part of it, and so are the UIDs of an
 /// image that was moved.
 ///
-/// The image database keeps it as bytes, so that every build of the image's study comes to the same image.
+/// The image database keeps it as bytes, so that every build of the image's study comes to the same image. Each
+/// thread uses one of its own.
 class KDD_EXPORT ImageOverlay
 {
 public:

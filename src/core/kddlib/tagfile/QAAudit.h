@@ -45,7 +45,7 @@ struct AuditEntry
 ///     ...                   three lines more for every further change
 ///                           an empty line ends the entry
 ///
-/// A line feed inside a text is written as ESC "n" and an ESC as ESC "e".
+/// A line feed inside a text is written as ESC "n" and an ESC as ESC "e". Each thread uses a copy of its own.
 class KDD_EXPORT AuditLog
 {
 public:

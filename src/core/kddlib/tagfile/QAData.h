@@ -25,7 +25,7 @@ struct QASubstitution
 /// A correction of stored images, to be applied by `TagFile::applyQA`: an edit of a study, or with an old study a move
 /// of images from there into the study.
 ///
-/// A value.
+/// A value. Each thread uses a copy of its own.
 struct KDD_EXPORT QAData
 {
     QByteArray studyUID;

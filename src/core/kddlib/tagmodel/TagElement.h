@@ -31,7 +31,7 @@ namespace Kdd
 ///
 /// Numbers are little-endian, the order of the machine. Values share their bytes when copied.
 ///
-/// Owned by the map that stores it. No operation throws or logs.
+/// Owned by the map that stores it. No operation throws or logs. Used by the thread that uses the tree.
 class KDD_EXPORT TagElement
 {
 public:

@@ -340,7 +340,8 @@ private:
 };
 
 /// Walks the merged view of a node, its parent and its grandparent in key order, each key once with the nearest
-/// node's element, missing ones skipped. Valid until one of the three own maps changes.
+/// node's element, missing ones skipped. Valid until one of the three own maps changes. Used by the thread that uses
+/// the tree.
 class KDD_EXPORT TagMap::iterator
 {
 public:

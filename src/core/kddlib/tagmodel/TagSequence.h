@@ -13,7 +13,7 @@ class TagMap;
 ///
 /// Owns its items. A copy made by construction or assignment shares the items without owning them, so it must not
 /// outlive its source, nor what its source does to them; what is added to the copy is the copy's own. `clone()` is the
-/// deep copy.
+/// deep copy. Used by the thread that uses the tree.
 class KDD_EXPORT TagSequence : public TagElement
 {
 public:

@@ -32,7 +32,8 @@ struct Slice
 /// The slices of a stack, in order.
 ///
 /// Nearly every stack has one slice per image, in the order of the images or in the reverse order. Such a run
-/// is kept as its length alone, so that the length that a file claims costs no memory.
+/// is kept as its length alone, so that the length that a file claims costs no memory. Each thread uses a copy of its
+/// own.
 class KDD_EXPORT SliceList
 {
 public:

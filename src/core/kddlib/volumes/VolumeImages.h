@@ -12,7 +12,7 @@ class TagMap;
 /// The images of a volume, which belong to the study's tree. Every image knows the lists that name it: one that goes
 /// away or leaves its series leaves a gap, at once and in constant time, so that none of the pointers ever dangles.
 ///
-/// A copy names the same images.
+/// A copy names the same images. Used by the thread that uses the tree.
 class KDD_EXPORT VolumeImages
 {
 public:

@@ -17,7 +17,7 @@ namespace Kdd
 
 class OrlanMesh;
 
-/// What a tag file takes over from one volume file. A value.
+/// What a tag file takes over from one volume file. A value. Each thread uses a copy of its own.
 struct KDD_EXPORT VolumeInfo
 {
     std::vector<std::string> imageUIDs;  ///< distinct SOP Instance UIDs

@@ -9,7 +9,7 @@
 namespace Kdd
 {
 
-/// An upload was given up because one of its steps failed too often.
+/// An upload was given up because one of its steps failed too often. Thrown on the thread that writes.
 class KDD_EXPORT RetryPolicyExhaustedError : public std::runtime_error
 {
 public:
@@ -26,7 +26,8 @@ private:
     std::string mCause;
 };
 
-/// The cloud storage said something after which there is no use in going on with an upload.
+/// The cloud storage said something after which there is no use in going on with an upload. Thrown on the thread that
+/// writes.
 class KDD_EXPORT UnrecoverableResponseError : public std::runtime_error
 {
 public:

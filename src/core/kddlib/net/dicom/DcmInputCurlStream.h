@@ -6,14 +6,14 @@
 namespace Kdd
 {
 
-/// A download as the source of DCMTK's parser.
+/// A download as the source of DCMTK's parser. Used by one thread at a time.
 class KDD_EXPORT DcmCurlProducer : public DownloadProducer
 {
 public:
     using DownloadProducer::DownloadProducer;
 };
 
-/// A download that has begun as DCMTK's parser reads it.
+/// A download that has begun as DCMTK's parser reads it. Used by one thread at a time.
 class KDD_EXPORT DcmInputCurlStream : public DownloadInputStream
 {
 public:

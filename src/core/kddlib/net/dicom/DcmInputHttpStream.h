@@ -8,7 +8,7 @@
 namespace Kdd
 {
 
-/// A request of its own as the source of DCMTK's parser. Without one it is in error.
+/// A request of its own as the source of DCMTK's parser. Without one it is in error. Used by one thread at a time.
 class KDD_EXPORT DcmHttpProducer : public DownloadProducer
 {
 public:
@@ -17,7 +17,7 @@ public:
     void request(const std::string& url, const std::string& bearerToken);
 };
 
-/// A file of a storage server, asked for by the stream itself, as DCMTK's parser reads it.
+/// A file of a storage server, asked for by the stream itself, as DCMTK's parser reads it. Used by one thread at a time.
 class KDD_EXPORT DcmInputHttpStream : public DownloadInputStream
 {
 public:

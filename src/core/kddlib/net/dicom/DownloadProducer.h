@@ -22,7 +22,8 @@ namespace Kdd
 /// the object is fetched into memory first, up to the bound of a response. The last bytes read are kept.
 ///
 /// Conditions: "End-of-file reached on input operation" for bytes beyond the end, "Read/write error on IO operation"
-/// when the transfer broke off, "Logical error on IO operation" without a stream, "putback failed".
+/// when the transfer broke off, "Logical error on IO operation" without a stream, "putback failed". Used by one
+/// thread at a time.
 class KDD_EXPORT DownloadProducer : public DcmProducer
 {
 public:

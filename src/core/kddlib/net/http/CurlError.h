@@ -8,7 +8,7 @@
 namespace Kdd
 {
 
-/// A request that could not be set up or carried out.
+/// A request that could not be set up or carried out. A value; thrown on the thread that asked.
 class KDD_EXPORT CurlError : public std::exception
 {
 public:

@@ -10,7 +10,8 @@
 namespace Kdd
 {
 
-/// What became of an HTTP request: what the server answered, and whether the answer came through. A value.
+/// What became of an HTTP request: what the server answered, and whether the answer came through. A value. Each
+/// thread uses a copy of its own.
 struct KDD_EXPORT KxHttpStatus
 {
     /// The response code; 0 as long as no header has arrived.

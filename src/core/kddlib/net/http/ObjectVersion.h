@@ -10,7 +10,7 @@ namespace Kdd
 struct KxHttpStatus;
 
 /// Tells one version of an object from the next by what the server says of it, so that parts fetched one after another
-/// are never put together from two of them. A value.
+/// are never put together from two of them. A value. Each thread uses a copy of its own.
 struct KDD_EXPORT ObjectVersion
 {
     std::string entityTag;

@@ -1,0 +1,39 @@
+#pragma once
+
+#include "tools/kdd/Commands.h"
+
+namespace Kdd
+{
+
+// What several commands are told to work on, and the arguments that tell it.
+
+struct ScanRequest
+{
+    QList<QByteArray> paths;
+    bool tolerant = false;  ///< of damaged DICOM files take what is sound
+
+    void addTo(ArgumentList& arguments);
+};
+
+struct StudySelection
+{
+    QList<QByteArray> studies;
+    bool all = false;
+
+    void addTo(ArgumentList& arguments);
+};
+
+/// A node of a study: the study, one of its series or one of its images.
+struct NodeSelection
+{
+    QByteArray study;  ///< UID or a unique beginning of it
+    QByteArray series;
+    QByteArray image;
+
+    void addTo(ArgumentList& arguments);
+};
+
+/// The argument of a command that works on one study.
+constexpr Argument kOneStudy = {"UID", kStudy, "Study Instance UID, or a unique beginning of it", true};
+
+}  // namespace Kdd

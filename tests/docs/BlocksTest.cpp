@@ -1,0 +1,117 @@
+#include "Pages.h"
+#include "SampleArchive.h"
+#include "kddlib/tagfile/QAData.h"
+
+#include <QSettings>
+
+using namespace Kdd;
+
+namespace
+{
+
+/// What the pages show, done as they say.
+class Blocks : public SampleArchive
+{
+};
+
+TEST_F(Blocks, AllSayInWhichLanguageTheyAreAndAreTested)
+{
+    // "text" is for layouts and diagrams, which nothing can run.
+    const QStringList languages =
+        QStringLiteral("c cmake console cpp ini python sh text xml").split(QLatin1Char(' '));
+    for (const Block& block : allBlocks())
+        EXPECT_TRUE(languages.contains(block.language))
+            << block.place() << " is in \"" << block.language.toStdString()
+            << "\", which no test knows how to run";
+    EXPECT_EQ(blocksIn("cpp").size() + blocksIn("c").size(), std::size_t(KDD_COMPILED_BLOCKS))
+        << "the build compiles them";
+}
+
+TEST_F(Blocks, OfCommandsCanBeTyped)
+{
+    for (const Block& block : blocksIn("console")) {
+        QDir(path("store")).removeRecursively();
+        const QStringList commands = block.commands();
+        // A tour that makes its own studies begins with nothing.
+        if (!block.text.contains(QLatin1String("$ kdd sample")))
+            fill();
+        const Answer answer = shell(commands);
+        EXPECT_EQ(answer.exitCode, 0) << block.place() << '\n' << answer.err.toStdString();
+    }
+    EXPECT_FALSE(mStorage.object("bucket/all.png").isEmpty());
+    EXPECT_TRUE(QFile::exists(path("a.dcm")));
+}
+
+TEST_F(Blocks, InPythonRunAsFarAsTheirModulesAreThere)
+{
+    for (const Block& block : blocksIn("python")) {
+        putBeside("block.py", block.text.toUtf8());
+        const Answer compiled = shell({QStringLiteral("python3 -m py_compile block.py")});
+        EXPECT_EQ(compiled.exitCode, 0) << block.place() << '\n' << compiled.err.toStdString();
+        const Answer answer = shell({QStringLiteral("python3 block.py")});
+        EXPECT_TRUE(answer.exitCode == 0 || answer.err.contains("ModuleNotFoundError"))
+            << block.place() << '\n'
+            << answer.err.toStdString();
+    }
+    if (QFile::exists(path("a.vol"))) {
+        EXPECT_EQ(shell({QStringLiteral("kdd --json index a.vol")}).number("volumes"), 1);
+    }
+}
+
+/// What installs, or belongs into a project of the reader's own, is parsed only.
+TEST_F(Blocks, ForTheShellAndCMakeAreWellFormed)
+{
+    for (const Block& block : blocksIn("sh")) {
+        putBeside("block.sh", block.text.toUtf8());
+        EXPECT_EQ(shell({QStringLiteral("sh -n block.sh")}).exitCode, 0) << block.place();
+    }
+    for (const Block& block : blocksIn("cmake")) {
+        putBeside("block.cmake", "if(FALSE)\n" + block.text.toUtf8() + "endif()\n");
+        EXPECT_EQ(shell({QStringLiteral("cmake -P block.cmake")}).exitCode, 0) << block.place();
+    }
+}
+
+TEST_F(Blocks, InXmlAreJobsAndInIniAreSettings)
+{
+    for (const Block& block : blocksIn("xml")) {
+        QAData job;
+        QString message;
+        EXPECT_TRUE(job.parse(block.text.toUtf8(), message))
+            << block.place() << ": " << message.toStdString();
+    }
+    const QString settings = pageText(QStringLiteral("docs/settings.md"));
+    for (const Block& block : blocksIn("ini")) {
+        putBeside("kdd.ini", substituted(block.text).toUtf8());
+        const QSettings file(path("kdd.ini"), QSettings::IniFormat);
+        EXPECT_FALSE(file.allKeys().isEmpty()) << block.place();
+        for (const QString& key : file.allKeys())
+            EXPECT_TRUE(settings.contains(
+                QStringLiteral("| `[%1]` `%2` |")
+                    .arg(key.section(QLatin1Char('/'), 0, 0), key.section(QLatin1Char('/'), 1))))
+                << block.place() << ": " << key.toStdString();
+        fill();
+        const Answer answer = shell({QStringLiteral("KDD_CONFIG=$PWD/kdd.ini kdd list")});
+        EXPECT_EQ(answer.exitCode, 0) << block.place() << '\n' << answer.err.toStdString();
+        EXPECT_FALSE(answer.err.contains("setting")) << answer.err.toStdString();
+    }
+}
+
+TEST_F(Blocks, ThatAreAProgramNameThePatientOfAnImageThatIsThere)
+{
+    addTwoStudies();
+    const QStringList programs = QStringLiteral(KDD_PROGRAMS).split(QLatin1Char('|'));
+    for (const QString& program : programs)
+        EXPECT_LE(run(program, {}).exitCode, 2) << "without arguments";
+    const auto ask = [&](const char* study, const char* image) {
+        return run(programs.first(), {path("store/meta"), QLatin1String(study), QLatin1String(image)});
+    };
+    EXPECT_TRUE(ask("1.2", "1").out.endsWith("Doe^J\n"));
+    EXPECT_EQ(ask("1.2", "1").exitCode, 0);
+    for (const auto& [study, image] : {std::pair("1.2", "7"), std::pair("1.3", "4"), std::pair("9", "1")}) {
+        const Answer answer = ask(study, image);
+        EXPECT_EQ(answer.exitCode, 1);
+        EXPECT_FALSE(answer.err.isEmpty());
+    }
+}
+
+}  // namespace

@@ -1,0 +1,81 @@
+#include "Pages.h"
+
+#include <QDirIterator>
+#include <QRegularExpression>
+
+#include <gtest/gtest.h>
+
+#include <map>
+#include <set>
+
+using namespace Kdd;
+
+namespace
+{
+
+/// Every C++ source below src by its path.
+std::map<QString, QString> sources()
+{
+    std::map<QString, QString> texts;
+    const QDir root(QStringLiteral(KDD_SOURCES));
+    for (QDirIterator it(root.filePath(QStringLiteral("src")),
+                         {QStringLiteral("*.h"), QStringLiteral("*.cpp")}, QDir::Files,
+                         QDirIterator::Subdirectories);
+         it.hasNext();) {
+        const QString path = root.relativeFilePath(it.next());
+        texts[path] = pageText(path);
+    }
+    return texts;
+}
+
+/// The first groups of all matches, joined by a blank where there are two.
+std::set<std::string> matches(const QString& text, const char* pattern)
+{
+    std::set<std::string> found;
+    const QRegularExpression expression(QString::fromLatin1(pattern), QRegularExpression::MultilineOption);
+    for (auto it = expression.globalMatch(text); it.hasNext();)
+        found.insert(it.next().capturedTexts().mid(1).join(QLatin1Char(' ')).toStdString());
+    return found;
+}
+
+const QString kSettingsPage = QStringLiteral("docs/settings.md");
+
+TEST(SettingsPage, NamesEveryVariableThatIsReadAndNoOther)
+{
+    std::set<std::string> read;
+    for (const auto& [path, text] : sources()) {
+        if (!matches(text, "(getenv|qEnvironmentVariable|envname)").empty())
+            read.merge(matches(text, "\"([A-Z]+_[A-Z_]+)\""));
+    }
+    EXPECT_GT(read.size(), 20U);
+    EXPECT_EQ(matches(pageText(kSettingsPage), "^\\| `([A-Z_]+)` \\|"), read);
+}
+
+TEST(SettingsPage, NamesThePlacesInTheFileAndTheDefaults)
+{
+    const QString page = pageText(kSettingsPage);
+    const QString source = pageText(QStringLiteral("src/platform/resources/ExResource.cpp"));
+    const char* const kInPage = "^\\| `([A-Z_]+)` \\| `\\[([a-z]+)\\]` `([a-z]+)` \\|";
+    EXPECT_EQ(matches(page, kInPage), matches(source, "\\{\"([A-Z_]+)\", \"([a-z]+)/([a-z]+)\",\\s"));
+    EXPECT_EQ(matches(page, (kInPage + std::string(" `([^`]+)` \\|")).c_str()),
+              matches(source, "\\{\"([A-Z_]+)\", \"([a-z]+)/([a-z]+)\",\\s+\"([^\"]+)\"\\}"));
+}
+
+TEST(ThreadsPage, TellsOfEveryClassThatIsExportedAndSoDoesItsHeader)
+{
+    std::set<std::string> exported;
+    for (const auto& [path, text] : sources()) {
+        const std::set<std::string> here = matches(text, "^(?:class|struct) KDD_EXPORT ([\\w:]+)");
+        exported.insert(here.begin(), here.end());
+        const char* const kWithComment =
+            "(?:^///.*thread.*\\n)(?:^///.*\\n)*^(?:class|struct) KDD_EXPORT ([\\w:]+)";
+        EXPECT_EQ(matches(text, kWithComment), here)
+            << "the comment says nothing of threads: " << path.toStdString();
+    }
+    std::set<std::string> told;
+    for (const std::string& cell : matches(pageText(QStringLiteral("docs/threads.md")), "^\\| (`[^|]+) \\|"))
+        told.merge(matches(QString::fromStdString(cell), "`([\\w:]+)`"));
+    EXPECT_EQ(told, exported);
+}
+
+}  // namespace

@@ -1,0 +1,100 @@
+#include "SampleArchive.h"
+
+#include "kddlib/tagfile/TagFile.h"
+
+#include <QFileInfo>
+#include <QRegularExpression>
+
+namespace Kdd
+{
+
+namespace
+{
+
+constexpr char kJob[] = "<Job><Substitutions><Tag Group='0010' Element='0010'><Value>Roe^R</Value></Tag>"
+                        "</Substitutions></Job>";
+constexpr char kStudy[] = "2.25.206249426979943135884564004311187862184";
+constexpr char kImage[] = "2.25.118095209191961083373906363074726608325\n";
+constexpr char kToken[] =
+    "HTTP/1.1 200 OK\r\n\r\n{\"access_token\":\"t\",\"token_type\":\"Bearer\",\"expires_in\":3600}";
+
+}  // namespace
+
+SampleArchive::SampleArchive()
+    : mTokens([](const QByteArray&) -> ScriptedServer::Reply { return {kToken}; })
+{
+    mEnvironment.insert(QStringLiteral("KDD_STORE"), path("store"));
+    mEnvironment.insert(QStringLiteral("PATH"), QFileInfo(QStringLiteral(KDD_BINARY)).path() +
+                                                    QLatin1Char(':') +
+                                                    mEnvironment.value(QStringLiteral("PATH")));
+    mEnvironment.insert(QStringLiteral("KDD_CLOUD_DOWNLOAD"), QString::fromStdString(mServer.url("")));
+    mServer.addFile("a.dcm", "of the server");
+    putBeside("job.xml", kJob);
+    putBeside("images.txt", kImage);
+    putBeside("scan.dcm", "of this machine");
+    addAccount();
+}
+
+void SampleArchive::fill()
+{
+    const Answer filled =
+        shell({QStringLiteral("kdd --quiet sample day --images 60"), QStringLiteral("kdd --quiet add day")});
+    EXPECT_EQ(filled.exitCode, 0) << filled.err.toStdString();
+    TagFile::setMetaFolder(QFile::encodeName(path("store/meta")).constData());
+    QFile::remove(path("copy.tc"));
+    EXPECT_TRUE(QFile::copy(TagFile::cacheFilePathForStudy(kStudy), path("copy.tc")));
+}
+
+void SampleArchive::addAccount()
+{
+    const Answer key = run(QStringLiteral("openssl"),
+                           {QStringLiteral("genpkey"), QStringLiteral("-algorithm"), QStringLiteral("RSA")});
+    const QJsonObject account{{QStringLiteral("type"), QStringLiteral("service_account")},
+                              {QStringLiteral("private_key_id"), QStringLiteral("k1")},
+                              {QStringLiteral("private_key"), QString::fromLatin1(key.out)},
+                              {QStringLiteral("client_email"), QStringLiteral("robot@hospital")},
+                              {QStringLiteral("token_uri"), QString::fromStdString(mTokens.url(""))}};
+    putBeside("account.json", QJsonDocument(account).toJson());
+}
+
+void SampleArchive::putBeside(const char* name, const QByteArray& content) const
+{
+    QFile file(path(name));
+    ASSERT_TRUE(file.open(QIODevice::WriteOnly));
+    ASSERT_EQ(file.write(content), content.size());
+}
+
+Answer SampleArchive::run(const QString& program, const QStringList& arguments) const
+{
+    Process process(kNoLimit);
+    process.setWorkingDirectory(mFolder.path());
+    process.setProcessEnvironment(mEnvironment);
+    process.start(program, arguments);
+    return finish(process);
+}
+
+QString SampleArchive::substituted(QString text) const
+{
+    const std::pair<const char*, QString> kStandIns[] = {
+        {"https://host/", QString::fromStdString(mServer.url(""))},
+        {"gs://bucket/a.dcm", QString::fromStdString(mServer.url("a.dcm"))},
+        {"/etc/kdd/service-account.json", path("account.json")},
+        {"/var/lib/kdd", path("store")},
+    };
+    for (const auto& [there, here] : kStandIns)
+        text.replace(QLatin1String(there), here);
+    // The door builds and tests everything, this test included: here it only has to know the word.
+    text.replace(QRegularExpression(QStringLiteral("^\\./dev (\\w+)")),
+                 QStringLiteral(KDD_SOURCES "/dev | grep '^  \\1 '"));
+    return text;
+}
+
+Answer SampleArchive::shell(const QStringList& commands) const
+{
+    QString script = QStringLiteral("set -ex\n");
+    for (const QString& command : commands)
+        script += substituted(command) + QLatin1Char('\n');
+    return run(QStringLiteral("sh"), {QStringLiteral("-c"), script});
+}
+
+}  // namespace Kdd
