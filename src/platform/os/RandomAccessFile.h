@@ -1,7 +1,5 @@
 #pragma once
 
-#include "platform/base/Export.h"
-
 #include <QtGlobal>
 
 namespace Kdd
@@ -23,7 +21,7 @@ struct FileIdentity
 };
 
 /// A file read at any place, without a position of its own. Closed when the object goes.
-class KDD_EXPORT RandomAccessFile
+class RandomAccessFile
 {
 public:
     RandomAccessFile() = default;

@@ -1,4 +1,3 @@
-#include "kddlib/tagmodel/TagMap.h"
 #include "tools/kdd/AttributeText.h"
 #include "tools/kdd/Commands.h"
 #include "tools/kdd/NodeLookup.h"
@@ -7,6 +6,7 @@
 #include <QTextStream>
 
 #include <dcmtk/dcmdata/dcdeftag.h>
+#include <kddlib/TagMap.h>
 
 #include <cstdio>
 

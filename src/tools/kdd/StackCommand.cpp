@@ -1,10 +1,11 @@
-#include "kddlib/archive/StudyStacker.h"
 #include "tools/kdd/CommandProgress.h"
 #include "tools/kdd/Commands.h"
 #include "tools/kdd/Database.h"
 #include "tools/kdd/Report.h"
 
 #include <QJsonArray>
+
+#include <kddlib/StudyStacker.h>
 
 #include <cstdio>
 

@@ -1,9 +1,3 @@
-#include "kddlib/tagfile/TagFile.h"
-#include "platform/base/BuildInfo.h"
-#include "platform/base/LogFile.h"
-#include "platform/database/Kxg.h"
-#include "platform/os/PathName.h"
-#include "platform/resources/ExResource.h"
 #include "tools/kdd/CommandProgress.h"
 #include "tools/kdd/Commands.h"
 
@@ -14,6 +8,12 @@
 
 #include <CLI/CLI.hpp>
 #include <dcmtk/oflog/oflog.h>
+#include <kddlib/BuildInfo.h>
+#include <kddlib/ExResource.h>
+#include <kddlib/Kxg.h>
+#include <kddlib/LogFile.h>
+#include <kddlib/PathName.h>
+#include <kddlib/TagFile.h>
 
 #include <algorithm>
 #include <cstdio>

@@ -92,7 +92,7 @@ QByteArray readWhole(KxCurlDownloadStream& stream, KxHttpStatus& status)
 
 }  // namespace
 
-struct KxCurlClient::Private
+struct KDD_LOCAL KxCurlClient::Private
 {
     ClientSettings currentSettings() const
     {

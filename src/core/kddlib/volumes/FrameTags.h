@@ -1,7 +1,8 @@
 #pragma once
 
+#include "platform/base/Export.h"
+
 #include <QByteArray>
-#include <QVector>
 
 #include <dcmtk/config/osconfig.h>
 
@@ -16,7 +17,7 @@ class TagMap;
 /// set for each frame and one that all frames share; any other image has the attributes itself.
 ///
 /// Points into the image, which must outlive it and stay unchanged.
-class FrameTags
+class KDD_EXPORT FrameTags
 {
 public:
     /// `frame` is 0-based.
@@ -39,8 +40,5 @@ private:
     const TagMap* mOwnGroups;
     const TagMap* mSharedGroups;
 };
-
-/// The numbers of a multi-valued text; none when one of them is no number or not finite.
-QVector<double> numbersOf(const QByteArray& text);
 
 }  // namespace Kdd

@@ -63,7 +63,7 @@ bool isHeaderText(const QString& text)
 
 }  // namespace
 
-struct KxGoogleAuth::Private
+struct KDD_LOCAL KxGoogleAuth::Private
 {
     bool loadFile();
     bool loadObject(const QJsonObject& object, const char* source);
