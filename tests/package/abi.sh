@@ -16,7 +16,7 @@ case $what in
         trap 'rm -f "$former"' EXIT
         xz -dc "$record" >"$former"
         # What is added does no harm.
-        abidiff --headers-dir2 "$headers" --drop-private-types --no-added-syms --no-show-locs "$former" "$library" || {
+        abidiff --no-architecture --headers-dir2 "$headers" --drop-private-types --no-added-syms --no-show-locs "$former" "$library" || {
             cat >&2 <<TXT
 
 Programs built against the recorded library would not run with this one as they did: see above what was removed or

@@ -35,9 +35,9 @@ case $how in
         program=./server
         ;;
 esac
-ldd "$program" | grep -q "libkdd.so.0 => $libraries/" || {
-    echo "$program runs with another library:" >&2
-    ldd "$program" >&2
+found=$(ldd "$program" | awk '/libkdd.so.0/ {print $3}')
+[ "$(realpath "$found")" = "$(realpath "$libraries/libkdd.so.0")" ] || {
+    echo "$program runs with another library: $found" >&2
     exit 1
 }
 "$program" "$folder/archive"

@@ -45,7 +45,8 @@ struct LockedOpenResult
 /// Opens `path` under the lock, at offset 0 and without ever truncating it: whoever wants it empty truncates it
 /// under the lock. The caller owns the descriptor. It is the file that bore the name at some moment under the lock,
 /// never one that was deleted or replaced before the lock was gained.
-KDD_EXPORT LockedOpenResult openLocked(const QString& path, FileLock lock, IfAbsent ifAbsent, LockPolling polling);
+KDD_EXPORT LockedOpenResult openLocked(const QString& path, FileLock lock, IfAbsent ifAbsent,
+                                       LockPolling polling);
 
 /// The same into `file`, which has to be closed: Shared opens it read-only, Exclusive for reading and writing. The
 /// descriptor in the result belongs to `file` then, and closing `file` ends the lock. As always with a QFile that is
