@@ -126,7 +126,8 @@ def exported(library):
 
 def undeclared(symbol, interface, declared):
     """Whether a symbol, demangled, belongs to nothing that a header declares."""
-    of = re.match(r"(?:typeinfo|typeinfo name|vtable|VTT|guard variable|(?:non-)?virtual thunk) (?:for|to) (.*)", symbol)
+    of = re.match(r"(?:typeinfo|typeinfo name|vtable|VTT|guard variable|(?:non-)?virtual thunk) (?:for|to) (.*)",
+                  symbol)
     if of and of[1] in interface.types:
         return False
     if (of[1] if of else symbol) in declared:

@@ -3,8 +3,8 @@
 
 usage: rooms.py SOURCE_FOLDER BUILD_FOLDER EXCEPTIONS
 
-BUILD_FOLDER is where the sources of SOURCE_FOLDER are compiled to. EXCEPTIONS has a line "FILE OTHER" for each arrow, by files below
-SOURCE_FOLDER, that is wrong and still there; one that is not needed any more is a fault.
+BUILD_FOLDER is where the sources of SOURCE_FOLDER are compiled to. EXCEPTIONS has a line "FILE OTHER" for each arrow, by
+files below SOURCE_FOLDER, that is wrong and still there; one that is not needed any more is a fault.
 """
 
 import os
