@@ -2,6 +2,7 @@
 
 #include "kddlib/Limits.h"
 #include "kddlib/tagmodel/TagMap.h"
+#include "platform/base/Result.h"
 #include "sample/Studies.h"
 
 #include <QFileInfo>
@@ -71,10 +72,11 @@ void makeSlice(DcmDataset& dataset, const Slice& slice)
 
 Workload::Workload(int images)
 {
-    const SampleSummary summary = writeSampleStudies(mFolder.path(), {40, 1}, [](int, int) {});
+    SampleSummary summary;
+    const Result result = writeSampleStudies(mFolder.path(), {40, 1}, {}, summary);
     DcmFileFormat pattern;
     const QString first = mFolder.filePath(QStringLiteral("CT-1/2/IM0001.dcm"));
-    if (summary.result.bad() || pattern.loadFile(first.toLocal8Bit().constData()).bad())
+    if (result.bad() || pattern.loadFile(first.toLocal8Bit().constData()).bad())
         throw std::runtime_error("the sample studies cannot be made");
     pattern.loadAllDataIntoMemory();
     for (int i = 1; i <= images; ++i) {

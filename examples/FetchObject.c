@@ -1,7 +1,7 @@
 /* Fetches an object of the network into a file, block by block, and holds its length against what the server said. */
 
 #include <inttypes.h>
-#include <kddlib/capi/kddstream.h>
+#include <kddlib/kddstream.h>
 #include <stdio.h>
 
 enum { BLOCK_SIZE = 65536 };

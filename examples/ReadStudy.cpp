@@ -3,9 +3,9 @@
 #include <dcmtk/config/osconfig.h>
 
 #include <dcmtk/dcmdata/dcdeftag.h>
-#include <kddlib/items/TextDecoding.h>
-#include <kddlib/tagfile/TagFile.h>
-#include <kddlib/tagmodel/TagMap.h>
+#include <kddlib/TagFile.h>
+#include <kddlib/TagMap.h>
+#include <kddlib/TextDecoding.h>
 
 #include <cstdio>
 

@@ -1,6 +1,6 @@
 /* Writes the tag file of a study to a file as the image database has it now; the tag file itself stays as it is. */
 
-#include <kddlib/capi/kddtagfile.h>
+#include <kddlib/kddtagfile.h>
 #include <stdio.h>
 
 enum { DEBUG_TO_STANDARD_ERROR = 1 };

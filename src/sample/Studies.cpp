@@ -1,5 +1,6 @@
 #include "sample/Studies.h"
 
+#include "platform/base/Result.h"
 #include "sample/Fault.h"
 #include "sample/Folder.h"
 #include "sample/Kinds.h"
@@ -119,8 +120,8 @@ void checkOptions(const SampleOptions& options)
 
 }  // namespace
 
-SampleSummary writeSampleStudies(const QString& folder, const SampleOptions& options,
-                                 const std::function<void(int done, int total)>& progress)
+Result writeSampleStudies(const QString& folder, const SampleOptions& options,
+                          const std::function<void(int done, int total)>& progress, SampleSummary& summary)
 {
     SampleFolder files(folder, progress);
     Result result;
@@ -133,9 +134,8 @@ SampleSummary writeSampleStudies(const QString& folder, const SampleOptions& opt
     } catch (const SampleFault& fault) {
         result = Result::failure(fault.sentence());
     }
-    SampleSummary summary = files.summary();
-    summary.result = result;
-    return summary;
+    summary = files.summary();
+    return result;
 }
 
 }  // namespace Kdd

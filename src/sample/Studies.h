@@ -1,13 +1,13 @@
 #pragma once
 
-#include "platform/base/Result.h"
-
 #include <QString>
 
 #include <functional>
 
 namespace Kdd
 {
+
+class Result;
 
 struct SampleOptions
 {
@@ -22,7 +22,6 @@ struct SampleSummary
     int series = 0;
     int images = 0;    // files, presentation states and reports among them
     qint64 bytes = 0;  // of all files together
-    Result result;     // a failure says what could not be written and why
 };
 
 /// Writes a day's work of a small hospital below `folder`, which is made when it is not there: CT, MR,
@@ -36,8 +35,9 @@ struct SampleSummary
 /// arrive later.
 ///
 /// A file appears under its name only when it is complete; a file of that name is replaced, others are left
-/// alone. The first failure ends the call. `progress`, which may be empty, is told after each file.
-SampleSummary writeSampleStudies(const QString& folder, const SampleOptions& options,
-                                 const std::function<void(int done, int total)>& progress);
+/// alone. The first failure ends the call; it says what could not be written and why, and `summary` what was written
+/// before. `progress`, which may be empty, is told after each file.
+Result writeSampleStudies(const QString& folder, const SampleOptions& options,
+                          const std::function<void(int done, int total)>& progress, SampleSummary& summary);
 
 }  // namespace Kdd

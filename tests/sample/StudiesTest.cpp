@@ -1,5 +1,7 @@
 #include "sample/Studies.h"
 
+#include "platform/base/Result.h"
+
 #include <QDirIterator>
 #include <QMap>
 #include <QTemporaryDir>
@@ -30,7 +32,8 @@ QMap<QString, QByteArray> filesBelow(const QTemporaryDir& folder)
 
 QMap<QString, QByteArray> written(const QTemporaryDir& folder, int images)
 {
-    EXPECT_EQ(writeSampleStudies(folder.path(), {images, 1}, {}).result.text(), QString());
+    SampleSummary summary;
+    EXPECT_EQ(writeSampleStudies(folder.path(), {images, 1}, {}, summary).text(), QString());
     return filesBelow(folder);
 }
 
@@ -111,9 +114,10 @@ TEST(SampleStudies, ThatCannotBeWrittenSayWhichFolderAndWhy)
     ASSERT_TRUE(file.open(QIODevice::WriteOnly));
     // Below /proc nobody can make a folder, not even who may do anything else.
     for (const QString& place : {file.fileName(), QStringLiteral("/proc/samples")}) {
-        const SampleSummary summary = writeSampleStudies(place, {30, 1}, {});
+        SampleSummary summary;
+        const Result result = writeSampleStudies(place, {30, 1}, {}, summary);
         const QString start = QLatin1String("Cannot make the folder ") + place + QLatin1String("/CT-1/1: ");
-        EXPECT_TRUE(summary.result.text().startsWith(start)) << qPrintable(summary.result.text());
+        EXPECT_TRUE(result.text().startsWith(start)) << qPrintable(result.text());
         EXPECT_EQ(summary.images, 0);
     }
     EXPECT_EQ(filesBelow(folder).size(), 1);

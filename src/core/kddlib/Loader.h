@@ -60,8 +60,12 @@ public:
     /// refreshes studies for months calls `clear` now and then.
     Volume* loadVolume(const char* path, const QByteArray& seriesUID, const QByteArray& studyUID);
 
-    /// See items/FileNaming.h.
+    /// The UIDs that the path of a served file names. "/" and "\\" both separate its parts. False, and both empty, when it
+    /// does not end in ".dcm" or names no folder.
     static bool extractUIDs(const char* path, QByteArray& sopUID, QByteArray& studyUID);
+
+    /// What tells several files of one instance apart: what stands between the last "_" of the file name and ".dcm"; the
+    /// whole stem when there is no "_", and empty when the path does not end in ".dcm".
     static QByteArray extractSuffix(const char* path);
 
 protected:

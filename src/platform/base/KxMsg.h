@@ -1,5 +1,6 @@
 #pragma once
 
+#include "platform/base/Export.h"
 #include "platform/base/Geometry.h"
 
 #include <QByteArray>
@@ -16,7 +17,7 @@ namespace Kdd
 ///
 /// Reading past the end gives zeros, takes nothing and leaves the message failed for good, so a reader may take a
 /// whole record and look at `failed()` once. Nothing throws and no byte outside the message is touched.
-class KxMsg
+class KDD_EXPORT KxMsg
 {
 public:
     /// An empty message to write to.

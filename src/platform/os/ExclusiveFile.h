@@ -45,7 +45,8 @@ struct LockedOpenResult
 /// Opens `path` under the lock, at offset 0 and without ever truncating it: whoever wants it empty truncates it
 /// under the lock. The caller owns the descriptor. It is the file that bore the name at some moment under the lock,
 /// never one that was deleted or replaced before the lock was gained.
-LockedOpenResult openLocked(const QString& path, FileLock lock, IfAbsent ifAbsent, LockPolling polling);
+KDD_EXPORT LockedOpenResult openLocked(const QString& path, FileLock lock, IfAbsent ifAbsent,
+                                       LockPolling polling);
 
 /// The same into `file`, which has to be closed: Shared opens it read-only, Exclusive for reading and writing. The
 /// descriptor in the result belongs to `file` then, and closing `file` ends the lock. As always with a QFile that is
@@ -57,6 +58,6 @@ KDD_EXPORT LockedOpenResult openLockedFile(QFile& file, const QString& path, Fil
 /// the reason in errno, when the system refuses; a file that is gone already counts as deleted.
 ///
 /// This is the one safe way to delete: those who wait for the lock notice and open the name anew.
-bool removeLocked(QFile& lockedFile, const QString& path);
+KDD_EXPORT bool removeLocked(QFile& lockedFile, const QString& path);
 
 }  // namespace Kdd

@@ -1,7 +1,5 @@
 #pragma once
 
-#include "platform/base/Export.h"
-
 #include <QtGlobal>
 
 namespace Kdd
@@ -24,7 +22,7 @@ struct FileIdentity
 
 /// A file read at any place, without a position of its own. Closed when the object goes. Once it is open any number
 /// of threads may read.
-class KDD_EXPORT RandomAccessFile
+class RandomAccessFile
 {
 public:
     RandomAccessFile() = default;

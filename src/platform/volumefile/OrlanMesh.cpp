@@ -57,7 +57,7 @@ Result checkFormat(hid_t root)
 
 }  // namespace
 
-struct OrlanMesh::Private
+struct KDD_LOCAL OrlanMesh::Private
 {
     QByteArray name;
     std::unique_ptr<ByteStore> store;

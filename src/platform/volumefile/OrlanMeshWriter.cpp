@@ -24,7 +24,7 @@ Result createGroup(hid_t parent, const char* name, Handle& group)
 
 }  // namespace
 
-struct OrlanMeshWriter::Private
+struct KDD_LOCAL OrlanMeshWriter::Private
 {
     QByteArray path;
     Lattice lattice;

@@ -10,7 +10,7 @@ namespace Kdd
 {
 
 /// A named value of a volume file: a text, or numbers.
-struct Parameter
+struct KDD_EXPORT Parameter
 {
     enum class Kind { Text, Integers, Reals };
 

@@ -1,5 +1,3 @@
-#include "kddlib/archive/FileScan.h"
-#include "kddlib/archive/StudyIntake.h"
 #include "tools/kdd/CommandProgress.h"
 #include "tools/kdd/Database.h"
 #include "tools/kdd/Report.h"
@@ -7,6 +5,9 @@
 #include "tools/kdd/Store.h"
 
 #include <QJsonArray>
+
+#include <kddlib/FileScan.h>
+#include <kddlib/StudyIntake.h>
 
 #include <cstdio>
 #include <memory>

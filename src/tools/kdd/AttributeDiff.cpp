@@ -1,8 +1,9 @@
 #include "tools/kdd/AttributeDiff.h"
 
-#include "kddlib/tagmodel/TagMap.h"
-#include "kddlib/tagmodel/TagSequence.h"
 #include "tools/kdd/AttributeText.h"
+
+#include <kddlib/TagMap.h>
+#include <kddlib/TagSequence.h>
 
 namespace Kdd
 {

@@ -1,11 +1,11 @@
 #include "tools/kdd/AttributeText.h"
 
-#include "kddlib/items/TextDecoding.h"
-#include "kddlib/tagmodel/TagMap.h"
 #include "tools/kdd/Report.h"
 
 #include <dcmtk/dcmdata/dcdeftag.h>
 #include <dcmtk/dcmdata/dctag.h>
+#include <kddlib/TagMap.h>
+#include <kddlib/TextDecoding.h>
 
 #include <cstring>
 

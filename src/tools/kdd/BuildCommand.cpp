@@ -1,9 +1,10 @@
-#include "kddlib/archive/StudyBuilders.h"
-#include "platform/base/LogFile.h"
 #include "tools/kdd/CommandProgress.h"
 #include "tools/kdd/Database.h"
 #include "tools/kdd/Report.h"
 #include "tools/kdd/Selection.h"
+
+#include <kddlib/LogFile.h>
+#include <kddlib/StudyBuilders.h>
 
 #include <cstdio>
 #include <memory>

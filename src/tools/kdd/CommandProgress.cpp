@@ -1,6 +1,6 @@
 #include "tools/kdd/CommandProgress.h"
 
-#include "platform/base/LogFile.h"
+#include <kddlib/LogFile.h>
 
 #include <csignal>
 

@@ -1,7 +1,8 @@
 #pragma once
 
-#include "kddlib/archive/WorkObserver.h"
 #include "tools/kdd/Progress.h"
+
+#include <kddlib/WorkObserver.h>
 
 namespace Kdd
 {

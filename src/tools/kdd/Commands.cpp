@@ -1,10 +1,9 @@
 #include "tools/kdd/Commands.h"
 
-#include "platform/os/PathName.h"
-
 #include <QFile>
 
 #include <CLI/CLI.hpp>
+#include <kddlib/PathName.h>
 
 #include <stdexcept>
 

@@ -1,8 +1,8 @@
 #pragma once
 
-#include "platform/base/Result.h"
-
 #include <QString>
+
+#include <kddlib/Result.h>
 
 namespace Kdd
 {

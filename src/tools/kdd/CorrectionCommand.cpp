@@ -1,14 +1,15 @@
-#include "kddlib/Limits.h"
-#include "kddlib/archive/ArchiveDatabase.h"
-#include "kddlib/archive/StudyChange.h"
-#include "kddlib/tagfile/QAData.h"
-#include "kddlib/tagfile/TagFile.h"
-#include "platform/base/LogFile.h"
 #include "tools/kdd/Commands.h"
 #include "tools/kdd/Report.h"
 #include "tools/kdd/Store.h"
 
 #include <QFile>
+
+#include <kddlib/ArchiveDatabase.h>
+#include <kddlib/Limits.h>
+#include <kddlib/LogFile.h>
+#include <kddlib/QAData.h>
+#include <kddlib/StudyChange.h>
+#include <kddlib/TagFile.h>
 
 #include <cstdio>
 #include <memory>

@@ -1,8 +1,9 @@
 #include "tools/kdd/Database.h"
 
-#include "platform/base/LogFile.h"
-#include "platform/database/Kxg.h"
 #include "tools/kdd/Store.h"
+
+#include <kddlib/Kxg.h>
+#include <kddlib/LogFile.h>
 
 namespace Kdd
 {

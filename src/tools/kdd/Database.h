@@ -1,6 +1,6 @@
 #pragma once
 
-#include "kddlib/archive/ArchiveDatabase.h"
+#include <kddlib/ArchiveDatabase.h>
 
 #include <memory>
 

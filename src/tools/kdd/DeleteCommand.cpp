@@ -1,8 +1,9 @@
-#include "kddlib/archive/StudyChange.h"
 #include "tools/kdd/Database.h"
 #include "tools/kdd/Report.h"
 #include "tools/kdd/Selection.h"
 #include "tools/kdd/Store.h"
+
+#include <kddlib/StudyChange.h>
 
 namespace Kdd
 {

@@ -1,6 +1,3 @@
-#include "kddlib/archive/DicomInput.h"
-#include "kddlib/tagmodel/TagMap.h"
-#include "platform/base/LogFile.h"
 #include "tools/kdd/AttributeDiff.h"
 #include "tools/kdd/Commands.h"
 #include "tools/kdd/Report.h"
@@ -8,6 +5,10 @@
 
 #include <QFileInfo>
 #include <QJsonArray>
+
+#include <kddlib/DicomInput.h>
+#include <kddlib/LogFile.h>
+#include <kddlib/TagMap.h>
 
 #include <cstdio>
 #include <memory>

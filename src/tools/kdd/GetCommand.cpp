@@ -1,6 +1,3 @@
-#include "kddlib/net/KxCurlClient.h"
-#include "kddlib/net/http/KxCurlDownloadStream.h"
-#include "platform/base/LogFile.h"
 #include "tools/kdd/Commands.h"
 #include "tools/kdd/PartialFile.h"
 #include "tools/kdd/Progress.h"
@@ -8,6 +5,10 @@
 
 #include <QFileInfo>
 #include <QUrl>
+
+#include <kddlib/KxCurlClient.h>
+#include <kddlib/KxCurlDownloadStream.h>
+#include <kddlib/LogFile.h>
 
 #include <cstdio>
 #include <future>

@@ -1,17 +1,16 @@
 #include "tools/kdd/GlobalArguments.h"
 
-#include "platform/base/BuildInfo.h"
-#include "platform/base/LogFile.h"
-#include "platform/database/Kxg.h"
-#include "platform/os/PathName.h"
-#include "platform/resources/ExResource.h"
-
 #include <QStandardPaths>
 
 #include <dcmtk/config/osconfig.h>
 
 #include <CLI/CLI.hpp>
 #include <dcmtk/oflog/oflog.h>
+#include <kddlib/BuildInfo.h>
+#include <kddlib/ExResource.h>
+#include <kddlib/Kxg.h>
+#include <kddlib/LogFile.h>
+#include <kddlib/PathName.h>
 
 #include <algorithm>
 #include <map>

@@ -1,7 +1,8 @@
 #pragma once
 
-#include "kddlib/tagfile/TagFile.h"
 #include "tools/kdd/Commands.h"
+
+#include <kddlib/TagFile.h>
 
 #include <string>
 

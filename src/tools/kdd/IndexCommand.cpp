@@ -1,11 +1,12 @@
-#include "kddlib/archive/FileScan.h"
-#include "kddlib/archive/Registration.h"
-#include "kddlib/tagmodel/TagMap.h"
 #include "tools/kdd/CommandProgress.h"
 #include "tools/kdd/Database.h"
 #include "tools/kdd/Report.h"
 #include "tools/kdd/Selection.h"
 #include "tools/kdd/Store.h"
+
+#include <kddlib/FileScan.h>
+#include <kddlib/Registration.h>
+#include <kddlib/TagMap.h>
 
 #include <cstdio>
 #include <memory>

@@ -1,5 +1,3 @@
-#include "kddlib/tagfile/TagFile.h"
-#include "platform/base/LogFile.h"
 #include "tools/kdd/Commands.h"
 #include "tools/kdd/Database.h"
 #include "tools/kdd/Report.h"
@@ -7,6 +5,9 @@
 #include <QDate>
 #include <QFileInfo>
 #include <QJsonArray>
+
+#include <kddlib/LogFile.h>
+#include <kddlib/TagFile.h>
 
 #include <cstdio>
 #include <memory>

@@ -1,7 +1,8 @@
 #include "tools/kdd/ManPage.h"
 
-#include "platform/base/BuildInfo.h"
 #include "tools/kdd/HelpText.h"
+
+#include <kddlib/BuildInfo.h>
 
 #include <ostream>
 

@@ -1,7 +1,8 @@
-#include "kddlib/items/DicomJson.h"
-#include "kddlib/tagmodel/TagMap.h"
 #include "tools/kdd/NodeLookup.h"
 #include "tools/kdd/Selection.h"
+
+#include <kddlib/DicomJson.h>
+#include <kddlib/TagMap.h>
 
 #include <iostream>
 

@@ -1,8 +1,9 @@
 #include "tools/kdd/NodeLookup.h"
 
-#include "kddlib/tagmodel/TagMap.h"
-#include "platform/base/LogFile.h"
 #include "tools/kdd/Store.h"
+
+#include <kddlib/LogFile.h>
+#include <kddlib/TagMap.h>
 
 namespace Kdd
 {

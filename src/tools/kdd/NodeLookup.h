@@ -1,7 +1,8 @@
 #pragma once
 
-#include "kddlib/tagfile/TagFile.h"
 #include "tools/kdd/Selection.h"
+
+#include <kddlib/TagFile.h>
 
 namespace Kdd
 {

@@ -1,12 +1,11 @@
 #include "tools/kdd/PartialFile.h"
 
-#include "platform/base/LogFile.h"
-#include "platform/os/ExclusiveFile.h"
-
 #include <QJsonDocument>
 #include <QJsonObject>
 #include <QSaveFile>
 
+#include <kddlib/ExclusiveFile.h>
+#include <kddlib/LogFile.h>
 #include <unistd.h>
 
 #include <cerrno>

@@ -1,9 +1,9 @@
 #pragma once
 
-#include "kddlib/net/http/ObjectVersion.h"
-
 #include <QFile>
 #include <QString>
+
+#include <kddlib/ObjectVersion.h>
 
 namespace Kdd
 {

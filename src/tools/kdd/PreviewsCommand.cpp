@@ -1,4 +1,3 @@
-#include "platform/base/LogFile.h"
 #include "tools/kdd/Commands.h"
 #include "tools/kdd/ContactSheet.h"
 #include "tools/kdd/Database.h"
@@ -6,6 +5,8 @@
 #include "tools/kdd/Store.h"
 
 #include <QDir>
+
+#include <kddlib/LogFile.h>
 
 #include <cstdio>
 #include <memory>

@@ -1,13 +1,14 @@
-#include "kddlib/net/KxCurlClient.h"
-#include "kddlib/net/cloud/KxCurlUploadStream.h"
-#include "kddlib/net/cloud/UploadErrors.h"
-#include "platform/base/LogFile.h"
 #include "tools/kdd/Commands.h"
 #include "tools/kdd/Database.h"
 #include "tools/kdd/Progress.h"
 #include "tools/kdd/Report.h"
 
 #include <QFile>
+
+#include <kddlib/KxCurlClient.h>
+#include <kddlib/KxCurlUploadStream.h>
+#include <kddlib/LogFile.h>
+#include <kddlib/UploadErrors.h>
 
 #include <cstdio>
 #include <memory>

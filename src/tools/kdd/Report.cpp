@@ -1,9 +1,9 @@
 #include "tools/kdd/Report.h"
 
-#include "kddlib/items/TextDecoding.h"
-#include "kddlib/tagmodel/TagMap.h"
-
 #include <QJsonDocument>
+
+#include <kddlib/TagMap.h>
+#include <kddlib/TextDecoding.h>
 
 #include <cstdio>
 

@@ -1,11 +1,11 @@
 #pragma once
 
-#include "kddlib/archive/DicomInput.h"
-
 #include <QJsonArray>
 #include <QJsonObject>
 #include <QList>
 #include <QStringList>
+
+#include <kddlib/DicomInput.h>
 
 #include <vector>
 

@@ -24,13 +24,14 @@ struct SampleRequest
 Outcome runSample(const GlobalOptions& options, const SampleRequest& request)
 {
     SampleSummary summary;
+    Result result;
     {
         Progress progress("Writing", !options.quiet);
-        summary = writeSampleStudies(request.folder, {request.images, request.seed},
-                                     [&](int done, int total) { progress.show(done, total); });
+        result = writeSampleStudies(
+            request.folder, {request.images, request.seed},
+            [&](int done, int total) { progress.show(done, total); }, summary);
     }
     int volumes = 0;
-    Result result = summary.result;
     if (result.good())
         result = writeSampleVolumes(request.folder, volumes, summary.bytes);
     if (!succeeded(result))

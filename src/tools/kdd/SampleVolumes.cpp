@@ -1,14 +1,14 @@
 #include "tools/kdd/SampleVolumes.h"
 
-#include "kddlib/tagfile/TagFile.h"
-#include "kddlib/tagmodel/OwnAttributes.h"
-#include "kddlib/tagmodel/TagElement.h"
-#include "kddlib/tagmodel/TagMap.h"
-#include "kddlib/volumes/StackPlanner.h"
-#include "kddlib/volumes/StackWriter.h"
-
 #include <QDir>
 #include <QFileInfo>
+
+#include <kddlib/OwnAttributes.h>
+#include <kddlib/StackPlanner.h>
+#include <kddlib/StackWriter.h>
+#include <kddlib/TagElement.h>
+#include <kddlib/TagFile.h>
+#include <kddlib/TagMap.h>
 
 namespace Kdd
 {

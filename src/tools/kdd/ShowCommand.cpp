@@ -1,5 +1,3 @@
-#include "kddlib/items/DicomJson.h"
-#include "kddlib/tagmodel/TagMap.h"
 #include "tools/kdd/AttributeText.h"
 #include "tools/kdd/NodeLookup.h"
 #include "tools/kdd/Report.h"
@@ -8,6 +6,8 @@
 #include <QTextStream>
 
 #include <dcmtk/dcmdata/dcdeftag.h>
+#include <kddlib/DicomJson.h>
+#include <kddlib/TagMap.h>
 
 #include <cstdio>
 #include <iostream>

@@ -1,10 +1,11 @@
-#include "kddlib/archive/StudyStacker.h"
 #include "tools/kdd/CommandProgress.h"
 #include "tools/kdd/Database.h"
 #include "tools/kdd/Report.h"
 #include "tools/kdd/Selection.h"
 
 #include <QJsonArray>
+
+#include <kddlib/StudyStacker.h>
 
 #include <cstdio>
 #include <memory>

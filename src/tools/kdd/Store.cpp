@@ -1,13 +1,14 @@
 #include "tools/kdd/Store.h"
 
-#include "kddlib/archive/FileWalk.h"
-#include "platform/base/LogFile.h"
-#include "platform/database/Kxg.h"
-#include "platform/os/FileStatus.h"
-#include "platform/os/PathName.h"
 #include "tools/kdd/Database.h"
 
 #include <QByteArrayList>
+
+#include <kddlib/FileStatus.h>
+#include <kddlib/FileWalk.h>
+#include <kddlib/Kxg.h>
+#include <kddlib/LogFile.h>
+#include <kddlib/PathName.h>
 
 namespace Kdd
 {

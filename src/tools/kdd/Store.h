@@ -1,11 +1,12 @@
 #pragma once
 
-#include "kddlib/tagfile/TagFile.h"
-#include "platform/database/Catalogue.h"
 #include "tools/kdd/Commands.h"
 
 #include <QByteArray>
 #include <QList>
+
+#include <kddlib/Catalogue.h>
+#include <kddlib/TagFile.h>
 
 namespace Kdd
 {

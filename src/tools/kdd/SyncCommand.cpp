@@ -1,9 +1,10 @@
-#include "kddlib/archive/StudyChange.h"
-#include "kddlib/tagfile/TagFile.h"
 #include "tools/kdd/Database.h"
 #include "tools/kdd/Report.h"
 #include "tools/kdd/Selection.h"
 #include "tools/kdd/Store.h"
+
+#include <kddlib/StudyChange.h>
+#include <kddlib/TagFile.h>
 
 #include <cstdio>
 #include <memory>

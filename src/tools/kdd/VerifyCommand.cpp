@@ -1,10 +1,11 @@
-#include "kddlib/archive/StudyCheck.h"
-#include "platform/base/LogFile.h"
 #include "tools/kdd/CommandProgress.h"
 #include "tools/kdd/Database.h"
 #include "tools/kdd/Report.h"
 #include "tools/kdd/Selection.h"
 #include "tools/kdd/Store.h"
+
+#include <kddlib/LogFile.h>
+#include <kddlib/StudyCheck.h>
 
 #include <cstdio>
 #include <memory>

@@ -1,4 +1,3 @@
-#include "platform/base/LogFile.h"
 #include "tools/kdd/BashCompletion.h"
 #include "tools/kdd/CommandProgress.h"
 #include "tools/kdd/Commands.h"
@@ -7,6 +6,7 @@
 #include "tools/kdd/ManPage.h"
 
 #include <CLI/CLI.hpp>
+#include <kddlib/LogFile.h>
 
 #include <cstdio>
 #include <exception>

@@ -1,7 +1,7 @@
 /* What C programs rely on: the headers are plain C, and the functions have these types. */
 
-#include <kddlib/capi/kddstream.h>
-#include <kddlib/capi/kddtagfile.h>
+#include <kddlib/kddstream.h>
+#include <kddlib/kddtagfile.h>
 
 void (*const kddConfigureLogging)(short, const char*) = ConfigureLogging;
 bool (*const kddRemovals[])(const char*, int, const char**) = {DeleteImagesInTagFile, DeleteSeriesInTagFile};

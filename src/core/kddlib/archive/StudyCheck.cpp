@@ -6,6 +6,7 @@
 #include "kddlib/archive/FileWalk.h"
 #include "kddlib/archive/WorkObserver.h"
 #include "kddlib/net/dicom/KxDcmFileLoader.h"
+#include "kddlib/tagfile/BuildCorrections.h"
 #include "kddlib/tagfile/StudyRecord.h"
 #include "kddlib/tagfile/TagFile.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
@@ -67,8 +68,11 @@ StudyCheck::StudyCheck(Kxg::Catalogue& catalogue, WorkObserver& observer,
     : mCatalogue(catalogue)
     , mObserver(observer)
     , mReport(std::move(report))
+    , mCorrections(std::make_unique<BuildCorrections>())
 {
 }
+
+StudyCheck::~StudyCheck() = default;
 
 void StudyCheck::fault(const QString& text)
 {
@@ -116,7 +120,7 @@ void StudyCheck::check(const QByteArray& studyUID)
         ++mFindings.unreadable;
         return;
     }
-    if (mContents.isCorrected && !succeeded(mCorrections.read(mContents.id))) {
+    if (mContents.isCorrected && !succeeded(mCorrections->read(mContents.id))) {
         ++mFindings.unreadable;
         return;
     }
@@ -232,9 +236,9 @@ void StudyCheck::checkImage(const QByteArray& key, const TagMap& image)
     std::unique_ptr<TagMap> expected;
     if (mContents.isCorrected)
         expected.reset(TagMap::createTagMap(dicom.getDataset(), kDefaultValueBound));
-    if (expected == nullptr || mCorrections.find(identityOf(*expected, path)) == nullptr)
+    if (expected == nullptr || mCorrections->find(identityOf(*expected, path)) == nullptr)
         mFindings.differences += verifyDataset(*dicom.getDataset(), image, report);
-    else if (mCorrections.applyTo(*expected, path))
+    else if (mCorrections->applyTo(*expected, path))
         mFindings.differences += verifyCorrected(*expected, image, report);
     else
         ++mFindings.unreadable;

@@ -1,6 +1,5 @@
 #pragma once
 
-#include "kddlib/tagfile/BuildCorrections.h"
 #include "platform/base/Export.h"
 #include "platform/database/Catalogue.h"
 
@@ -8,10 +7,12 @@
 #include <QString>
 
 #include <functional>
+#include <memory>
 
 namespace Kdd
 {
 
+class BuildCorrections;
 class TagFile;
 class TagMap;
 class WorkObserver;
@@ -35,6 +36,9 @@ class KDD_EXPORT StudyCheck
 public:
     /// `report` receives a line for each fault. Both must outlive the object, and so must the catalogue.
     StudyCheck(Kxg::Catalogue& catalogue, WorkObserver& observer, std::function<void(const QString&)> report);
+    ~StudyCheck();
+    StudyCheck(const StudyCheck&) = delete;
+    StudyCheck& operator=(const StudyCheck&) = delete;
 
     /// A study that the catalogue knows.
     void check(const QByteArray& studyUID);
@@ -58,7 +62,7 @@ private:
     const std::function<void(const QString&)> mReport;
     CheckFindings mFindings;
     Kxg::StudyContents mContents;
-    BuildCorrections mCorrections;
+    std::unique_ptr<BuildCorrections> mCorrections;  // of that study
 };
 
 }  // namespace Kdd

@@ -17,14 +17,14 @@ KDD_EXPORT QString decodeText(const QByteArray& bytes, const QByteArray& charact
 
 /// Converts a dataset to UTF-8 as a whole, declared character set included. False when that cannot be done: a text
 /// does not fit its character set, or items declare one of their own. The dataset may be half converted then.
-bool convertToUtf8(DcmItem& dataset);
+KDD_EXPORT bool convertToUtf8(DcmItem& dataset);
 
 /// Converts every value on its own, as `decodeText` does, by the character set of its item. Values that are UTF-8
 /// already stay as they are; where nothing changes the declared character sets stay as well. Whether
 /// anything has changed.
-bool convertValuesToUtf8(DcmItem& dataset);
+KDD_EXPORT bool convertValuesToUtf8(DcmItem& dataset);
 
 /// Declares UTF-8 throughout a dataset of nothing but ASCII, unless it declares what no one knows.
-void declareUtf8(DcmItem& dataset);
+KDD_EXPORT void declareUtf8(DcmItem& dataset);
 
 }  // namespace Kdd

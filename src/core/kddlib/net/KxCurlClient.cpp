@@ -61,7 +61,7 @@ void requireCloudObject(const std::string& address)
 
 }  // namespace
 
-struct KxCurlClient::Private
+struct KDD_LOCAL KxCurlClient::Private
 {
     /// A copy, so that no request sees half of a change.
     ClientSettings currentSettings() const

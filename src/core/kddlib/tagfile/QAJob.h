@@ -17,7 +17,7 @@ namespace Kdd
 bool movesImages(const DcmTagKey& key);
 
 /// One run of a job over the files that it concerns. All of it happens in memory; the files are written at the end.
-class TagFile::QAJob
+class KDD_LOCAL TagFile::QAJob
 {
 public:
     QAJob(QAData& job, QString& message)

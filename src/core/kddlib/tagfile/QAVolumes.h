@@ -8,7 +8,7 @@ namespace Kdd
 
 /// Takes the volumes of a series apart by the series that hold its images now. Used by one thread, while both tag files
 /// are held.
-class TagFile::QAVolumes
+class KDD_LOCAL TagFile::QAVolumes
 {
 public:
     /// Takes the volumes out of a series, before the first of its images is touched.

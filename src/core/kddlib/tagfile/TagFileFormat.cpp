@@ -88,7 +88,7 @@ bool uncompress(const QByteArray& stored, quint8 mode, QByteArray& body)
 }  // namespace
 
 /// Puts the records of a body into the indexes and the tree of a tag file.
-class TagFile::BodyReader
+class KDD_LOCAL TagFile::BodyReader
 {
 public:
     BodyReader(TagFile& file, const char* studyUID, const QList<QByteArray>& blobs)

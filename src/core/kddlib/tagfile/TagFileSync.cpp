@@ -86,7 +86,7 @@ const std::vector<Kxg::ImageFile> kNoImages;
 
 /// What the database lists of a study, in terms of the tree that is held. Corrections are no part of the database: an
 /// image that they gave another UID, series or study is listed as what it was before.
-class TagFile::DatabaseView
+class KDD_LOCAL TagFile::DatabaseView
 {
 public:
     DatabaseView(const TagFile& file, const Kxg::DicomDirectoryEntry& study)

@@ -62,7 +62,7 @@ int asInt(qint64 value)
 
 /// Makes the records of a study's tree, and refuses a tree of which its reader would lose something: whatever the
 /// reader does not take must not reach the file that is there.
-class TagFile::BodyWriter
+class KDD_LOCAL TagFile::BodyWriter
 {
 public:
     explicit BodyWriter(const TagFile& file)

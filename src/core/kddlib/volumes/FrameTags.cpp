@@ -2,6 +2,7 @@
 
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/tagmodel/TagSequence.h"
+#include "kddlib/volumes/StackFrameReader.h"
 
 #include <dcmtk/dcmdata/dcdeftag.h>
 

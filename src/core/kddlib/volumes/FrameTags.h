@@ -1,5 +1,7 @@
 #pragma once
 
+#include "platform/base/Export.h"
+
 #include <QByteArray>
 
 #include <dcmtk/config/osconfig.h>
@@ -15,7 +17,7 @@ class TagMap;
 /// set for each frame and one that all frames share; any other image has the attributes itself.
 ///
 /// Points into the image, which must outlive it and stay unchanged.
-class FrameTags
+class KDD_EXPORT FrameTags
 {
 public:
     /// `frame` is 0-based.

@@ -1,6 +1,7 @@
 #include "kddlib/volumes/StackFrame.h"
 
 #include "kddlib/tagmodel/TagMap.h"
+#include "kddlib/volumes/StackFrameReader.h"
 #include "platform/base/Decimal.h"
 #include "platform/base/Result.h"
 

@@ -2,11 +2,9 @@
 
 #include "kddlib/volumes/FrameTags.h"
 #include "kddlib/volumes/Vec3d.h"
-#include "platform/base/Export.h"
 
 #include <QByteArray>
 #include <QString>
-#include <QVector>
 
 namespace Kdd
 {
@@ -62,10 +60,5 @@ struct LeftOutFrame
     int frame = -1;  ///< 0-based; -1 for all frames of the image
     QString reason;
 };
-
-LeftOutFrame leftOutFrame(const StackFrame& frame, const QString& reason);
-
-/// The frames of an image that can be slices; the others go to `leftOut`.
-QVector<StackFrame> stackFramesOf(const TagMap& image, QVector<LeftOutFrame>& leftOut);
 
 }  // namespace Kdd

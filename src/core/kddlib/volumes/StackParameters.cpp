@@ -2,6 +2,7 @@
 
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
+#include "kddlib/volumes/StackFrameReader.h"
 #include "kddlib/volumes/StackPlanner.h"
 #include "kddlib/volumes/StackValues.h"
 #include "platform/base/Decimal.h"

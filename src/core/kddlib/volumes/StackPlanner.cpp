@@ -1,6 +1,7 @@
 #include "kddlib/volumes/StackPlanner.h"
 
 #include "kddlib/tagmodel/TagMap.h"
+#include "kddlib/volumes/StackFrameReader.h"
 #include "kddlib/volumes/StackSplit.h"
 #include "platform/base/Result.h"
 

@@ -1,5 +1,7 @@
 #include "kddlib/volumes/StackSplit.h"
 
+#include "kddlib/volumes/StackFrameReader.h"
+
 #include <QHash>
 #include <QMap>
 

@@ -63,7 +63,7 @@ bool isHeaderText(const QString& text)
 
 }  // namespace
 
-struct KxGoogleAuth::Private
+struct KDD_LOCAL KxGoogleAuth::Private
 {
     bool startWith(const ServiceAccountKey& newKey, const Result& reading);
     bool loadFile();

@@ -30,6 +30,6 @@ KDD_EXPORT OFCondition readDamagedDicomFile(const char* path, DcmFileFormat& fil
 
 /// `strict`, by which reading the file failed, unless the image database has the file as one that was taken although it
 /// is damaged and that has not changed since: then the file is read as above, with a warning.
-OFCondition readAsRegistered(const char* path, DcmFileFormat& file, const OFCondition& strict);
+KDD_EXPORT OFCondition readAsRegistered(const char* path, DcmFileFormat& file, const OFCondition& strict);
 
 }  // namespace Kdd

@@ -27,6 +27,6 @@ private:
 };
 
 /// An error's text as `LogFile::write` takes it: the line ends are those of a CurlError, all else is escaped.
-std::string textForLog(const std::exception& error);
+KDD_EXPORT std::string textForLog(const std::exception& error);
 
 }  // namespace Kdd

@@ -1,0 +1,55 @@
+#!/usr/bin/env bash
+# Makes the packages of a build, looks into them, and unpacks them into a folder as if that were the root of a machine.
+# usage: packages.sh CPACK BUILD_FOLDER FOLDER
+set -euo pipefail
+cpack=$1 build=$2 folder=$3
+root=$folder/root
+
+fail() { echo "$*" >&2; exit 1; }
+
+rm -rf "$folder"
+mkdir -p "$root"
+"$cpack" --config "$build/CPackConfig.cmake" -B "$folder" >"$folder/cpack.log" 2>&1 || {
+    cat "$folder/cpack.log"
+    exit 1
+}
+
+# package NAME: its file, of which there is one.
+package() {
+    local files=("$folder/$1"_*.deb)
+    [ -e "${files[0]}" ] && [ ${#files[@]} -eq 1 ] || fail "There is not one package $1"
+    echo "${files[0]}"
+}
+
+# depends NAME FIELD PATTERN
+depends() { dpkg-deb -f "$(package "$1")" "$2" | grep -Eq "$3" || fail "$1: $2 does not name $3"; }
+
+for name in libkdd0 libkdd-dev kdd libkdd-video; do
+    dpkg -x "$(package "$name")" "$root"
+    [ -s "$root/usr/share/doc/$name/copyright" ] || fail "$name tells no licences"
+done
+depends libkdd0 Depends 'libqt5sql5-sqlite'
+depends libkdd0 Depends 'libhdf5'
+depends libkdd0 Recommends 'libqt5sql5-psql.*libkdd-video'
+depends libkdd-dev Depends 'libkdd0 \(= .*libboost-dev.*libdcmtk-dev.*qtbase5-dev'
+depends kdd Depends 'libkdd0 \(= '
+depends libkdd-video Depends 'libavcodec'
+for name in libkdd0 libkdd-dev kdd; do
+    ! dpkg-deb -f "$(package "$name")" Depends | grep -q libav || fail "$name needs FFmpeg"
+done
+# Nothing runs when packages come or go but ldconfig, so that nothing of them stays either.
+for name in libkdd0 libkdd-dev kdd libkdd-video; do
+    scripts=$(dpkg-deb --ctrl-tarfile "$(package "$name")" | tar -t | grep -E '(pre|post)(inst|rm)$' || true)
+    [ -z "$scripts" ] || fail "$name has scripts: $scripts"
+done
+dpkg-deb -I "$(package libkdd0)" triggers | grep -qx 'activate-noawait ldconfig' || fail "libkdd0 does not tell ldconfig"
+
+headers=$root/usr/include/kddlib
+[ -z "$(find "$headers" -mindepth 1 -type d)" ] || fail "Installed headers lie in folders"
+! grep -rn '#include "' "$headers" || fail "An installed header names a folder of the source"
+! grep -rIl "$build" "$root/usr" || fail "These know where they were built"
+for file in "$root"/usr/bin/kdd "$root"/usr/lib/*/libkdd.so.0 "$root"/usr/lib/*/kddlib/kdd-video.so; do
+    ! readelf -d "$file" | grep -E 'R(UN)?PATH' | grep -v '\[\$ORIGIN/' || fail "$file looks for libraries elsewhere"
+done
+
+"$root/usr/bin/kdd" --version
