@@ -2,8 +2,8 @@
 // the log that it leaves in an image can be read back. A text that is no log is never taken for one of other bytes.
 
 #include "fuzz/Property.h"
-#include "kddlib/tagfile/QAAudit.h"
-#include "kddlib/tagfile/QAEditor.h"
+#include "kddlib/tagfile/qa/QAAudit.h"
+#include "kddlib/tagfile/qa/QAEditor.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
 

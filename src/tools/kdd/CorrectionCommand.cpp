@@ -1,7 +1,7 @@
 #include "kddlib/Limits.h"
 #include "kddlib/archive/StudyChange.h"
-#include "kddlib/tagfile/QAData.h"
 #include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagfile/qa/QAData.h"
 #include "platform/base/LogFile.h"
 #include "tools/kdd/Commands.h"
 #include "tools/kdd/Report.h"

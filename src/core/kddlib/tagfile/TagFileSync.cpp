@@ -1,5 +1,5 @@
-#include "kddlib/tagfile/QAAudit.h"
 #include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagfile/qa/QAAudit.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"

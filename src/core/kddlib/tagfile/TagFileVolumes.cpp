@@ -1,7 +1,7 @@
 #include "kddlib/previews/QuadrantNavigation.h"
 #include "kddlib/tagfile/NodeAttributes.h"
 #include "kddlib/tagfile/TagFile.h"
-#include "kddlib/tagfile/VolumeIndex.h"
+#include "kddlib/tagfile/format/VolumeIndex.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/Volume.h"

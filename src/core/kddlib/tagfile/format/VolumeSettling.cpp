@@ -1,5 +1,5 @@
 #include "kddlib/tagfile/TagFile.h"
-#include "kddlib/tagfile/VolumeIndex.h"
+#include "kddlib/tagfile/format/VolumeIndex.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/Volume.h"
 #include "platform/base/LogFile.h"

@@ -1,4 +1,4 @@
-#include "kddlib/tagfile/BuildCorrections.h"
+#include "kddlib/tagfile/qa/BuildCorrections.h"
 
 #include "kddlib/tagfile/TagFile.h"
 #include "platform/base/LogFile.h"

@@ -1,7 +1,7 @@
 #pragma once
 
-#include "kddlib/tagfile/QASeriesMove.h"
 #include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagfile/qa/QASeriesMove.h"
 
 namespace Kdd
 {

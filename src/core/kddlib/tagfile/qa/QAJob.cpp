@@ -1,5 +1,6 @@
+#include "kddlib/tagfile/qa/QAJob.h"
+
 #include "kddlib/tagfile/NodeAttributes.h"
-#include "kddlib/tagfile/QAJob.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"

@@ -1,4 +1,4 @@
-#include "kddlib/tagfile/ImageOverlay.h"
+#include "kddlib/tagfile/qa/ImageOverlay.h"
 
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"

@@ -1,7 +1,7 @@
 #pragma once
 
-#include "kddlib/tagfile/QAAudit.h"
-#include "kddlib/tagfile/QAData.h"
+#include "kddlib/tagfile/qa/QAAudit.h"
+#include "kddlib/tagfile/qa/QAData.h"
 #include "kddlib/tagmodel/VrCode.h"
 
 namespace Kdd

@@ -1,8 +1,8 @@
-#include "kddlib/tagfile/QAEditor.h"
+#include "kddlib/tagfile/qa/QAEditor.h"
 
 #include "kddlib/items/TextDecoding.h"
 #include "kddlib/items/TextEncoding.h"
-#include "kddlib/tagfile/QAValues.h"
+#include "kddlib/tagfile/qa/QAValues.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"

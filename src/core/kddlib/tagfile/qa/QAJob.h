@@ -1,9 +1,9 @@
 #pragma once
 
-#include "kddlib/tagfile/QAEditor.h"
-#include "kddlib/tagfile/QARecord.h"
-#include "kddlib/tagfile/QASeriesMove.h"
 #include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagfile/qa/QAEditor.h"
+#include "kddlib/tagfile/qa/QARecord.h"
+#include "kddlib/tagfile/qa/QASeriesMove.h"
 
 #include <algorithm>
 #include <map>

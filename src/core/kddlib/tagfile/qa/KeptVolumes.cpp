@@ -1,4 +1,4 @@
-#include "kddlib/tagfile/QAVolumes.h"
+#include "kddlib/tagfile/qa/QAVolumes.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/VolumeInfo.h"

@@ -1,4 +1,4 @@
-#include "kddlib/tagfile/CorrectedVolumes.h"
+#include "kddlib/tagfile/qa/CorrectedVolumes.h"
 
 #include "kddlib/tagfile/TagFile.h"
 #include "kddlib/tagmodel/TagMap.h"

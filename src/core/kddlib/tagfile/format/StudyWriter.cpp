@@ -1,6 +1,6 @@
 #include "kddlib/Limits.h"
 #include "kddlib/tagfile/TagFile.h"
-#include "kddlib/tagfile/TagFileFrame.h"
+#include "kddlib/tagfile/format/TagFileFrame.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/KxMsg.h"
 #include "platform/base/LogFile.h"

@@ -1,4 +1,4 @@
-#include "kddlib/tagfile/QAAudit.h"
+#include "kddlib/tagfile/qa/QAAudit.h"
 
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"

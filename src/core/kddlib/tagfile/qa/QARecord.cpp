@@ -1,9 +1,9 @@
-#include "kddlib/tagfile/QARecord.h"
+#include "kddlib/tagfile/qa/QARecord.h"
 
-#include "kddlib/tagfile/BuildCorrections.h"
-#include "kddlib/tagfile/QAData.h"
 #include "kddlib/tagfile/StudyRecord.h"
 #include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagfile/qa/BuildCorrections.h"
+#include "kddlib/tagfile/qa/QAData.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"

@@ -1,7 +1,7 @@
-#include "kddlib/tagfile/QAData.h"
+#include "kddlib/tagfile/qa/QAData.h"
 
 #include "kddlib/Limits.h"
-#include "kddlib/tagfile/QAEditor.h"
+#include "kddlib/tagfile/qa/QAEditor.h"
 #include "platform/base/LogFile.h"
 
 #include <QXmlStreamReader>

@@ -1,6 +1,6 @@
 #pragma once
 
-#include "kddlib/tagfile/QAAudit.h"
+#include "kddlib/tagfile/qa/QAAudit.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/Export.h"
 

@@ -1,4 +1,4 @@
-#include "kddlib/tagfile/AdoptedCorrections.h"
+#include "kddlib/tagfile/qa/AdoptedCorrections.h"
 
 #include "kddlib/Limits.h"
 #include "kddlib/net/dicom/KxDcmFileLoader.h"

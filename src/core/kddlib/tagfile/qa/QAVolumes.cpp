@@ -1,5 +1,6 @@
-#include "kddlib/tagfile/QAVolumes.h"
-#include "kddlib/tagfile/VolumeIndex.h"
+#include "kddlib/tagfile/qa/QAVolumes.h"
+
+#include "kddlib/tagfile/format/VolumeIndex.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/os/PathName.h"

@@ -1,4 +1,4 @@
-#include "kddlib/tagfile/ImageIdentity.h"
+#include "kddlib/tagfile/qa/ImageIdentity.h"
 
 #include "kddlib/tagmodel/TagMap.h"
 

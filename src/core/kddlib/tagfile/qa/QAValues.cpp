@@ -1,4 +1,4 @@
-#include "kddlib/tagfile/QAValues.h"
+#include "kddlib/tagfile/qa/QAValues.h"
 
 #include <QDate>
 #include <QList>

@@ -1,6 +1,6 @@
 #pragma once
 
-#include "kddlib/tagfile/BuildCorrections.h"
+#include "kddlib/tagfile/qa/BuildCorrections.h"
 #include "platform/base/Result.h"
 
 #include <QSet>

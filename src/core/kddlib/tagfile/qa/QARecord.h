@@ -1,7 +1,7 @@
 #pragma once
 
-#include "kddlib/tagfile/ImageIdentity.h"
-#include "kddlib/tagfile/QAAudit.h"
+#include "kddlib/tagfile/qa/ImageIdentity.h"
+#include "kddlib/tagfile/qa/QAAudit.h"
 #include "platform/base/Result.h"
 #include "platform/database/Catalogue.h"
 

@@ -1,4 +1,4 @@
-#include "kddlib/tagfile/VolumeIndex.h"
+#include "kddlib/tagfile/format/VolumeIndex.h"
 
 #include "kddlib/Limits.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
