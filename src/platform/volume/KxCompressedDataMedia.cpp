@@ -17,7 +17,6 @@
 #include <cmath>
 #include <limits>
 #include <new>
-#include <system_error>
 
 namespace Kdd
 {
@@ -30,9 +29,9 @@ class FileRange : public MediaSource
 public:
     Result open(const QString& path, qint64 offset, qint64 size)
     {
-        const int error = mFile.open(pathBytes(path).constData());
-        if (error != 0)
-            return Result::failure(QString::fromLocal8Bit(std::system_category().message(error).c_str()));
+        const Result opened = mFile.open(pathBytes(path).constData());
+        if (opened.bad())
+            return opened;
         if (offset < 0 || size <= 0 || offset >= mFile.size())
             return Result::failure(QStringLiteral("there are no %1 bytes at %2").arg(size).arg(offset));
         mOffset = offset;

@@ -1,7 +1,6 @@
 #include "platform/volumefile/ReadStore.h"
 
 #include <cstring>
-#include <system_error>
 #include <utility>
 
 namespace Kdd::VolumeFile
@@ -19,10 +18,7 @@ bool ReadStore::truncate(qint64 /*size*/)
 
 Result FileToRead::open(const QByteArray& path)
 {
-    const int error = mFile.open(path.constData());
-    if (error == 0)
-        return {};
-    return Result::failure(QString::fromLocal8Bit(std::system_category().message(error).c_str()));
+    return mFile.open(path.constData());
 }
 
 bool FileToRead::read(qint64 at, void* bytes, std::size_t size)

@@ -22,11 +22,6 @@ namespace
 
 constexpr int kPreamble = 128;
 
-QString errnoText(int error)
-{
-    return QString::fromLocal8Bit(std::strerror(error));
-}
-
 DicomInput& refuse(DicomInput& input, DicomInput::Kind kind, const QString& reason)
 {
     input.kind = kind;
@@ -154,8 +149,9 @@ DicomInput readDicomInput(const QByteArray& path, Damage damage)
     if (path.size() > Kxg::kMaxPath)
         return std::move(refuse(input, DicomInput::Kind::Unusable, QStringLiteral("Its path is too long")));
     RandomAccessFile file;
-    if (const int error = file.open(path.constData()))
-        return std::move(refuse(input, DicomInput::Kind::Unusable, errnoText(error)));
+    const Result opened = file.open(path.constData());
+    if (opened.bad())
+        return std::move(refuse(input, DicomInput::Kind::Unusable, opened.text()));
     input.fileBytes = file.size();
     if (input.fileBytes == 0)
         return std::move(refuse(input, DicomInput::Kind::Unusable, QStringLiteral("The file is empty")));

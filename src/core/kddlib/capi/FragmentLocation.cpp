@@ -76,7 +76,7 @@ bool locateFirstFragment(const char* path, DcmFileFormat& file, FragmentLocation
     const qint64 table = positionOfPixelData(path);
     const qint64 fragment = table + kItemHeaderSize + tableLength;
     RandomAccessFile bytes;
-    if (bytes.open(path) != 0 || !hasItem(bytes, table, tableLength) || !hasItem(bytes, fragment, length))
+    if (bytes.open(path).bad() || !hasItem(bytes, table, tableLength) || !hasItem(bytes, fragment, length))
         return false;
     location = {fragment + kItemHeaderSize, length, sequence->card() == 2};
     return true;

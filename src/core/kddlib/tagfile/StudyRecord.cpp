@@ -95,7 +95,7 @@ Kxg::BuiltStudy builtStudy(const TagFile& file)
 bool isTagFile(const QString& path, const Kxg::TagFileStamp& stamp)
 {
     RandomAccessFile file;
-    if (stamp.digest.isEmpty() || hasJournal(path) || file.open(pathBytes(path).constData()) != 0 ||
+    if (stamp.digest.isEmpty() || hasJournal(path) || file.open(pathBytes(path).constData()).bad() ||
         file.size() < stamp.size)
         return false;
     QByteArray content(static_cast<int>(stamp.size), Qt::Uninitialized);

@@ -30,7 +30,7 @@ const QByteArray kSequenceEnd("\xfe\xff\xdd\xe0\0\0\0\0", 8);
 bool readWhole(const char* path, QByteArray& bytes)
 {
     RandomAccessFile file;
-    if (file.open(path) != 0 || file.size() > kMaxFileBytes)
+    if (file.open(path).bad() || file.size() > kMaxFileBytes)
         return false;
     bytes.resize(static_cast<int>(file.size()));
     return file.readAt(0, bytes.data(), bytes.size()) == bytes.size();
