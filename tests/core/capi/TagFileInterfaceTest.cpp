@@ -85,8 +85,9 @@ TEST(TagFileRemoval, IsTriedSixTimes)
     for (int failures = 0; failures <= 6; ++failures) {
         const LogCapture log;
         int attempts = 0;
-        const bool isGone = removeTagFile(QStringLiteral("f"),
-                                          [&](const QString&) { return ++attempts > failures ? 0 : 21; });
+        const bool isGone = removeTagFile(QStringLiteral("f"), [&](const QString&) {
+            return SystemResult::of(++attempts > failures ? 0 : 21);
+        });
         EXPECT_EQ(isGone, failures < 6);
         EXPECT_EQ(attempts, std::min(failures + 1, 6));
         const std::string line = isGone

@@ -30,7 +30,7 @@ bool removeStudyFile(const QByteArray& studyUID)
 {
     const QString path = TagFile::cacheFilePathForStudy(studyUID.constData());
     for (int i = 0; i < kRemovalAttempts; ++i) {
-        if (removeTagFileOnce(path) == 0)
+        if (removeTagFileOnce(path).good())
             return true;
         QThread::msleep(kPause);
     }

@@ -1,5 +1,8 @@
+#include "kddlib/tagfile/format/StudyReader.h"
+
 #include "kddlib/Limits.h"
-#include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagfile/StudyTree.h"
+#include "kddlib/tagfile/TagFileSettings.h"
 #include "kddlib/tagfile/format/TagFileFrame.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
@@ -57,6 +60,7 @@ QList<QByteArray> readBlobs(QDataStream& in, qint32& count)
 {
     count = 0;
     in >> count;
+    // A table that ends early is accepted: what is missing are pictures, which can be made again.
     QList<QByteArray> blobs;
     for (qint32 i = 0; i < count && !in.atEnd(); ++i) {
         QByteArray blob;
@@ -71,28 +75,35 @@ QList<QByteArray> readBlobs(QDataStream& in, qint32& count)
 /// False when the mode is none of ours; damage gives an empty body.
 bool uncompress(const QByteArray& stored, quint8 mode, QByteArray& body)
 {
-    switch (static_cast<TagFile::CompressionMode>(mode)) {
-    case TagFile::CompressionMode::None:
+    // The bound goes along: a few bytes may claim to become gigabytes.
+    switch (static_cast<TagFileSettings::CompressionMode>(mode)) {
+    case TagFileSettings::CompressionMode::None:
         body = stored;
         return true;
-    case TagFile::CompressionMode::Zlib:
+    case TagFileSettings::CompressionMode::Zlib:
         body = qxUncompress(stored, kMaxBodySize);
         return true;
-    case TagFile::CompressionMode::Lzma:
+    case TagFileSettings::CompressionMode::Lzma:
         body = lzmaUncompress(stored, kMaxBodySize);
         return true;
     }
     return false;
 }
 
+Result refuse(const char* reason)
+{
+    LogFile::errorf("%s", reason);
+    return Result::failure(QLatin1String(reason));
+}
+
 }  // namespace
 
-/// Puts the records of a body into the indexes and the tree of a tag file.
-class TagFile::BodyReader
+/// Puts the records of a body into the indexes and the tree of a study.
+class StudyBodyReader
 {
 public:
-    BodyReader(TagFile& file, const char* studyUID, const QList<QByteArray>& blobs)
-        : mFile(file)
+    StudyBodyReader(StudyTree& tree, const char* studyUID, const QList<QByteArray>& blobs)
+        : mTree(tree)
         , mWanted(studyUID)
         , mContext{blobs, kMaxElements, 0}
     {
@@ -112,6 +123,8 @@ public:
         return !body.failed();
     }
 
+    int volumes() const { return mVolumes; }
+
 private:
     bool take(quint8 marker, KxMsg& record)
     {
@@ -125,7 +138,7 @@ private:
         case kVolumesRecord:
             return mSeries == nullptr || takeVolumes(record);
         default:
-            return true;
+            return true;  // what a later release may write has a length, too
         }
     }
 
@@ -134,7 +147,7 @@ private:
     {
         mStudy = nullptr;
         mSeries = nullptr;
-        if (!mFile.mStudies.isEmpty())
+        if (!mTree.isEmpty())
             return true;
         auto study = std::make_shared<TagMap>();
         study->deserialize(record, nullptr, mContext);
@@ -142,7 +155,7 @@ private:
         if (record.failed() || (mWanted != nullptr && uid != mWanted))
             return !record.failed();
         mStudy = study.get();
-        mFile.mStudies.insert(uid, study);
+        mTree.enterStudy(uid, study);
         return true;
     }
 
@@ -151,29 +164,29 @@ private:
         mSeries = readBelow(record, mStudy);
         const QByteArray uid = mSeries->uid(TagMap::SeriesLevel);
         // Two series of one UID are no tree that was ever written.
-        if (record.failed() || mFile.mSeries.contains(uid))
+        if (record.failed() || mTree.series().contains(uid))
             return false;
-        mFile.mSeries.insert(uid, mSeries);
+        mTree.enterSeries(uid, mSeries);
         return true;
     }
 
     bool takeImage(KxMsg& record)
     {
         TagMap* image = readBelow(record, mSeries);
-        const QByteArray key = imageKey(*image);
+        const QByteArray key = StudyTree::imageKey(*image);
         // No file of ours holds an image twice; in a hostile one each would be searched for among its siblings.
-        TagMap* replaced = mFile.mImages.find(key);
+        TagMap* replaced = mTree.imageUnder(key);
         if (replaced != nullptr && ++mReplacedImages > kMaxReplacedImages)
             return false;
         delete replaced;
-        mFile.mImages.insert(key, image);
+        mTree.enterImage(key, image);
         return !record.failed();
     }
 
     bool takeVolumes(KxMsg& record)
     {
         mSeries->deserializeVolumes(record, mContext.blobs);
-        mFile.mStatistics.volumes += mSeries->volumes().size();
+        mVolumes += mSeries->volumes().size();
         return !record.failed();
     }
 
@@ -185,25 +198,24 @@ private:
         return node;
     }
 
-    TagFile& mFile;
+    StudyTree& mTree;
     const char* mWanted;
     TagMap::RecordContext mContext;
     TagMap* mStudy = nullptr;
     TagMap* mSeries = nullptr;
     int mReplacedImages = 0;
+    int mVolumes = 0;
 };
 
-bool TagFile::readCacheFile(QDataStream& in, const char* studyUID)
+Result readStudy(QDataStream& in, const StudyRequest& request, StudyTree& tree, FileSizes& sizes)
 {
-    const QByteArray wanted(studyUID);  // may be that of the study that is held and let go of now
-    clear();
     Header header;
     if (in.readRawData(header.magic, sizeof header.magic) != int(sizeof header.magic) ||
         std::memcmp(header.magic, kMagic, sizeof kMagic) != 0)
-        return failReading(kIncorrectHeader);
+        return refuse(kIncorrectHeader);
     in >> header.version >> header.reserved >> header.layout >> header.compression;
     if (header.version != kVersion)
-        return failReading(kUnsupportedVersion);
+        return refuse(kUnsupportedVersion);
     QByteArray stored;
     QList<QByteArray> blobs;
     qint32 promised = 0;
@@ -214,29 +226,26 @@ bool TagFile::readCacheFile(QDataStream& in, const char* studyUID)
         in >> size;
         stored = readAtMost(in, qMin<qint64>(size, kMaxStoredBody));
         if (in.status() != QDataStream::Ok || size < 0 || stored.size() < size)
-            return failReading(kTruncated);
+            return refuse(kTruncated);
         blobs = readBlobs(in, promised);
     }
     QByteArray body;
     if (!uncompress(stored, header.compression, body))
-        return failReading(kUnsupportedCompression);
-    recordSizes(stored.size(), body.size(), blobs);
-    mStatistics.missingBlobs = qMax(0, promised - blobs.size());
-    if (mStatistics.missingBlobs > 0 && LogFile::debugLogging())
-        LogFile::printf("%s ends early: %d of %d previews are missing", qUtf8Printable(mCacheFilePath),
-                        mStatistics.missingBlobs, promised);
-    if (body.size() > kMaxBodySize ||
-        !BodyReader(*this, studyUID != nullptr ? wanted.constData() : nullptr, blobs).read(KxMsg(body))) {
-        clear();
-        return failReading(kDamaged);
+        return refuse(kUnsupportedCompression);
+    recordSizes(stored.size(), body.size(), blobs, sizes);
+    sizes.missingBlobs = qMax(0, promised - blobs.size());
+    if (sizes.missingBlobs > 0 && LogFile::debugLogging())
+        LogFile::printf("%s ends early: %d of %d previews are missing", qUtf8Printable(request.name),
+                        sizes.missingBlobs, promised);
+    StudyBodyReader reader(tree, request.studyUID, blobs);
+    if (body.size() > kMaxBodySize || !reader.read(KxMsg(body))) {
+        // Half a study must not be taken for a whole one and written back.
+        tree.clear();
+        sizes = {};
+        return refuse(kDamaged);
     }
-    return !mStudies.isEmpty() || fail(QLatin1String(kNoStudy));
-}
-
-bool TagFile::failReading(const char* reason)
-{
-    LogFile::errorf("%s", reason);
-    return fail(QLatin1String(reason));
+    sizes.volumes = reader.volumes();
+    return tree.isEmpty() ? Result::failure(QLatin1String(kNoStudy)) : Result();
 }
 
 }  // namespace Kdd

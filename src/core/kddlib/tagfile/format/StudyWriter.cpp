@@ -1,10 +1,11 @@
+#include "kddlib/tagfile/format/StudyWriter.h"
+
 #include "kddlib/Limits.h"
-#include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagfile/StudyTree.h"
 #include "kddlib/tagfile/format/TagFileFrame.h"
+#include "kddlib/tagfile/format/VolumeSettling.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/KxMsg.h"
-#include "platform/base/LogFile.h"
-#include "platform/base/Stopwatch.h"
 #include "platform/compression/LzmaCompress.h"
 #include "platform/compression/QxCompress.h"
 
@@ -26,67 +27,47 @@ const char* const kTooLarge = "Tag file would be larger than the format allows";
 const char* const kTooManyVolumeImages = "Tag file would hold volumes of more images than the format allows";
 const char* const kNotCompressed = "Tag file could not be compressed";
 
-QByteArray compressed(const QByteArray& body, TagFile::CompressionMode mode)
+QByteArray compressed(const QByteArray& body, TagFileSettings::CompressionMode mode)
 {
     switch (mode) {
-    case TagFile::CompressionMode::Zlib:
+    case TagFileSettings::CompressionMode::Zlib:
         return qxCompress(reinterpret_cast<const unsigned char*>(body.constData()), body.size());
-    case TagFile::CompressionMode::Lzma:
+    case TagFileSettings::CompressionMode::Lzma:
         return lzmaCompress(body);
-    case TagFile::CompressionMode::None:
+    case TagFileSettings::CompressionMode::None:
         break;
     }
     return body;
-}
-
-qint64 totalSize(const QList<QByteArray>& blobs)
-{
-    qint64 total = 0;
-    for (const QByteArray& blob : blobs)
-        total += blob.size();
-    return total;
-}
-
-/// All of a file but its body.
-qint64 sizeAround(const QList<QByteArray>& blobs)
-{
-    return kFrameSize + qint64(kBlobFrameSize) * blobs.size() + totalSize(blobs);
-}
-
-int asInt(qint64 value)
-{
-    return static_cast<int>(qMin<qint64>(value, std::numeric_limits<int>::max()));
 }
 
 }  // namespace
 
 /// Makes the records of a study's tree, and refuses a tree of which its reader would lose something: whatever the
 /// reader does not take must not reach the file that is there.
-class TagFile::BodyWriter
+class StudyBodyWriter
 {
 public:
-    explicit BodyWriter(const TagFile& file)
-        : mFile(file)
+    explicit StudyBodyWriter(const StudyTree& tree)
+        : mTree(tree)
     {
         mBody.reserve(kBodyReservation);
     }
 
-    /// False, with the reason in `refusal`, when the study must not be written.
-    bool write(const QByteArray& uid, const TagMap& study)
+    /// Fails when the study must not be written.
+    Result write(const QByteArray& uid, const TagMap& study)
     {
         if (study.uid(TagMap::StudyLevel) != uid)
-            return refuse(QStringLiteral("Tag file of study %1 would hold study %2")
-                              .arg(QString::fromLatin1(uid), nameOf(study.uid(TagMap::StudyLevel))));
+            return Result::failure(QStringLiteral("Tag file of study %1 would hold study %2")
+                                       .arg(QString::fromLatin1(uid), nameOf(study.uid(TagMap::StudyLevel))));
         bool isWritten = writeNode(kStudyRecord, study);
         for (auto series = study.children().begin(); series != study.children().end() && isWritten; ++series)
             isWritten = writeSeries(**series);
-        return isWritten;
+        return isWritten ? Result() : Result::failure(mRefusal);
     }
 
     const QByteArray& body() const { return mBody.bytes(); }
     const QList<QByteArray>& blobs() const { return mBlobs; }
     int volumes() const { return mVolumes; }
-    const QString& refusal() const { return mRefusal; }
 
 private:
     static QString nameOf(const QByteArray& uid)
@@ -122,10 +103,10 @@ private:
     /// Nearly every image stands in the index, which knows each name once. Others may have been renamed in the tree.
     bool checkImage(const TagMap& image)
     {
-        const QByteArray key = imageKey(image);
-        if (mFile.mImages.find(key) == &image)
+        const QByteArray key = StudyTree::imageKey(image);
+        if (mTree.imageUnder(key) == &image)
             return true;
-        if (mFile.mImages.find(key) != nullptr || mRenamed.contains(key))
+        if (mTree.imageUnder(key) != nullptr || mRenamed.contains(key))
             return refuse(QStringLiteral("Tag file would hold image %1 twice").arg(nameOf(key)));
         mRenamed.insert(key);
         return true;
@@ -139,7 +120,7 @@ private:
         return !mBody.failed() || refuse(QLatin1String(kTooManyVolumeImages));
     }
 
-    const TagFile& mFile;
+    const StudyTree& mTree;
     KxMsg mBody;
     QList<QByteArray> mBlobs;
     TagMap::WriteContext mContext{mBlobs, kMaxElements, 0, nullptr};
@@ -149,35 +130,30 @@ private:
     QString mRefusal;
 };
 
-bool TagFile::writeCacheFile(QDataStream& out)
+Result writeStudy(StudyTree& tree, TagFileSettings::CompressionMode mode, QDataStream& out, FileSizes& sizes)
 {
-    if (write(out, sCompressionMode))
-        return true;
-    LogFile::errorf("%s", qUtf8Printable(mFailure));
-    return false;
-}
-
-bool TagFile::write(QDataStream& out, CompressionMode mode)
-{
-    const Stopwatch stopwatch;
-    BodyWriter writer(*this);
-    for (auto study = mStudies.cbegin(); study != mStudies.cend(); ++study) {
+    StudyBodyWriter writer(tree);
+    for (auto study = tree.studies().cbegin(); study != tree.studies().cend(); ++study) {
         for (TagMap* series : study.value()->children()) {
-            const QString reason = settleVolumes(*series);
-            if (!reason.isEmpty())
-                return fail(reason);
+            Result settled = VolumeSettling::settle(*series);
+            if (settled.bad())
+                return settled;
         }
+        // An item inherits from the one at its place in the node above, as the reader will link them.
         study.value()->relinkItems();
-        if (!writer.write(study.key(), *study.value()))
-            return fail(writer.refusal());
+        Result written = writer.write(study.key(), *study.value());
+        if (written.bad())
+            return written;
     }
     const QByteArray& body = writer.body();
     const QList<QByteArray>& blobs = writer.blobs();
     if (body.size() > kMaxBodySize || sizeAround(blobs) + body.size() > kMaxFile)
-        return fail(QLatin1String(kTooLarge));
+        return Result::failure(QLatin1String(kTooLarge));
     const QByteArray stored = compressed(body, mode);
+    // An empty text is how the compressors say that they failed.
     if (stored.isEmpty() && !body.isEmpty())
-        return fail(QLatin1String(kNotCompressed));
+        return Result::failure(QLatin1String(kNotCompressed));
+    // From here on nothing is refused: the first byte goes out only when the last one is known.
     out.writeRawData(kMagic, sizeof kMagic);
     out << kVersion << quint8(0) << kLayout << static_cast<quint8>(mode);
     out << static_cast<qint32>(stored.size());
@@ -185,26 +161,9 @@ bool TagFile::write(QDataStream& out, CompressionMode mode)
     out << static_cast<qint32>(blobs.size());
     for (const QByteArray& blob : blobs)
         out << blob;
-    recordSizes(stored.size(), body.size(), blobs);
-    mStatistics.volumes = writer.volumes();
-    mStatistics.writeMs = stopwatch.elapsed();
-    return true;
-}
-
-void TagFile::recordSizes(qint64 storedBody, qint64 body, const QList<QByteArray>& blobs)
-{
-    const qint64 around = sizeAround(blobs);
-    mStatistics.blobs = blobs.size();
-    mStatistics.blobBytes = asInt(totalSize(blobs));
-    mStatistics.storedSize = asInt(storedBody + around);
-    mStatistics.uncompressedSize = asInt(body + around);
-}
-
-QByteArray TagFile::serialized(CompressionMode mode)
-{
-    QByteArray content;
-    QDataStream out(&content, QIODevice::WriteOnly);
-    return write(out, mode) ? content : QByteArray();
+    recordSizes(stored.size(), body.size(), blobs, sizes);
+    sizes.volumes = writer.volumes();
+    return {};
 }
 
 }  // namespace Kdd

@@ -1,6 +1,9 @@
 #pragma once
 
-#include <QtGlobal>
+#include "kddlib/tagfile/format/FileSizes.h"
+
+#include <QByteArray>
+#include <QList>
 
 namespace Kdd
 {
@@ -20,5 +23,11 @@ constexpr quint8 kStudyRecord = 0;
 constexpr quint8 kSeriesRecord = 1;
 constexpr quint8 kImageRecord = 2;
 constexpr quint8 kVolumesRecord = 3;
+
+/// All of a file but its body [bytes].
+qint64 sizeAround(const QList<QByteArray>& blobs);
+
+/// Of a file whose body has these sizes, as it is stored and before it was compressed [bytes].
+void recordSizes(qint64 storedBody, qint64 body, const QList<QByteArray>& blobs, FileSizes& sizes);
 
 }  // namespace Kdd

@@ -1,4 +1,5 @@
-#include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagfile/format/VolumeSettling.h"
+
 #include "kddlib/tagfile/format/VolumeIndex.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/Volume.h"
@@ -7,9 +8,6 @@
 #include <QHash>
 
 #include <algorithm>
-
-// The list of volumes in a tag file names no images: on reading, they are found by what each image says of its volumes.
-// So before a series is written, what its images say is held against the volumes they are in.
 
 namespace Kdd
 {
@@ -54,7 +52,7 @@ QHash<const TagMap*, int> countVolumes(const QList<Volume*>& volumes)
 }  // namespace
 
 /// A reader looks for the images of a volume in its own series only.
-void TagFile::releaseImagesOfOthers(const TagMap& series)
+void VolumeSettling::releaseImagesOfOthers(const TagMap& series)
 {
     for (Volume* volume : series.volumes()) {
         const QVector<TagMap*> images = volume->images();
@@ -69,9 +67,10 @@ void TagFile::releaseImagesOfOthers(const TagMap& series)
     }
 }
 
-QString TagFile::settleVolumes(TagMap& series)
+Result VolumeSettling::settle(TagMap& series)
 {
-    // Images that a reader finds in another order are put into that order.
+    // Three attempts, each changing more than the one before, so that a file that nobody touched is written again byte for
+    // byte. Images that a reader finds in another order are put into that order.
     const auto arrange = [](const VolumeShare& share, Volume* volume) {
         return volume->arrangeLike(share.images);
     };
@@ -90,18 +89,18 @@ QString TagFile::settleVolumes(TagMap& series)
     nameVolumes(series);
     if (areFoundByReader(series, arrange))
         return {};
-    renumberVolumes(series);
+    renumber(series);
     nameVolumes(series);
-    return areFoundByReader(series, arrange)
-               ? QString()
-               : QStringLiteral("the images of series %1 cannot tell its %2 volumes apart")
-                     .arg(QString::fromLatin1(series.uid(TagMap::SeriesLevel)))
-                     .arg(series.mVolumes.size());
+    if (areFoundByReader(series, arrange))
+        return {};
+    return Result::failure(QStringLiteral("the images of series %1 cannot tell its %2 volumes apart")
+                               .arg(QString::fromLatin1(series.uid(TagMap::SeriesLevel)))
+                               .arg(series.mVolumes.size()));
 }
 
 /// Indexes are places. An image of several volumes has a byte for each, so these get the first places; those for which
 /// no byte is left are read from their files.
-void TagFile::renumberVolumes(TagMap& series)
+void VolumeSettling::renumber(TagMap& series)
 {
     const QHash<const TagMap*, int> counts = countVolumes(series.mVolumes);
     const auto sharesImages = [&](const Volume* volume) {

@@ -2,7 +2,7 @@
 
 #include "kddlib/Limits.h"
 #include "kddlib/net/dicom/KxDcmFileLoader.h"
-#include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagfile/StudyTree.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
@@ -16,7 +16,7 @@
 namespace Kdd
 {
 
-AdoptedCorrections::AdoptedCorrections(const TagFile& former, const BuildCorrections& known,
+AdoptedCorrections::AdoptedCorrections(const QMap<QByteArray, TagMap*>& former, const BuildCorrections& known,
                                        QSet<QByteArray> listed)
     : mFormer(former)
     , mKnown(known)
@@ -28,7 +28,7 @@ AdoptedCorrections::~AdoptedCorrections() = default;
 
 Result AdoptedCorrections::record()
 {
-    for (const TagMap* image : mFormer.imagesByUID()) {
+    for (const TagMap* image : mFormer) {
         if (mResult.good())
             look(*image);
     }
@@ -55,7 +55,7 @@ void AdoptedCorrections::look(const TagMap& image)
         return leaveUndecided(image, "its audit log is damaged");
     if (entries.isEmpty())
         return;
-    const QByteArray key = TagFile::imageKey(image);
+    const QByteArray key = StudyTree::imageKey(image);
     ImageIdentity identity = {mKnown.studyUID(), key};
     std::vector<Kxg::ImageCorrection> elsewhere;
     const Kxg::ImageCorrection* known = mKnown.findShown(key, log);
@@ -125,7 +125,7 @@ bool AdoptedCorrections::isToBeKept(const TagMap& image, const AuditLog& log, co
     if (identity.studyUID == mKnown.studyUID())
         return mListed.contains(path) || isListed(identity, path);
     // A file that was replaced by one of another study is no image that was moved here.
-    const ImageIdentity before = identityBefore(log, {mKnown.studyUID(), TagFile::imageKey(image)}, path);
+    const ImageIdentity before = identityBefore(log, {mKnown.studyUID(), StudyTree::imageKey(image)}, path);
     if (before.studyUID != identity.studyUID)
         return false;
     if (isListed(identity, path))
@@ -153,13 +153,14 @@ void AdoptedCorrections::leaveUndecided(const TagMap& image, const char* reason)
 {
     const QByteArray path = filePathOf(image);
     LogFile::warnf("The corrections of image %s of study %s cannot be kept in the image database: %s",
-                   TagFile::imageKey(image).constData(), mKnown.studyUID().constData(), reason);
+                   StudyTree::imageKey(image).constData(), mKnown.studyUID().constData(), reason);
     if (mListed.contains(path))
         mUndecided.insert(path);
 }
 
 Result AdoptedCorrections::openCatalogue()
 {
+    // Not before it is needed: nearly all tag files tell of no correction that is not known.
     Result result;
     if (mCatalogue == nullptr)
         mCatalogue = Kxg::Catalogue::open(Kxg::DatabaseServer(), result);

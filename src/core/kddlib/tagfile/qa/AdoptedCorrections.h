@@ -3,6 +3,7 @@
 #include "kddlib/tagfile/qa/BuildCorrections.h"
 #include "platform/base/Result.h"
 
+#include <QMap>
 #include <QSet>
 
 #include <memory>
@@ -11,16 +12,17 @@
 namespace Kdd
 {
 
-class TagFile;
+class TagMap;
 
 /// Corrections that only a study's tag file tells of, made while there was no database or by a release that kept
 /// them nowhere else. A build hands them to the image database before it makes the tag file anew.
 class AdoptedCorrections
 {
 public:
-    /// What is there so far: the study's tag file and the corrections known, which must outlive the object, and the DICOM
-    /// files listed for the study.
-    AdoptedCorrections(const TagFile& former, const BuildCorrections& known, QSet<QByteArray> listed);
+    /// What is there so far: the images of the study's tag file and the corrections known, which must outlive the object,
+    /// and the DICOM files listed for the study.
+    AdoptedCorrections(const QMap<QByteArray, TagMap*>& former, const BuildCorrections& known,
+                       QSet<QByteArray> listed);
     ~AdoptedCorrections();
 
     /// Looks through the tag file and has what it finds recorded. On failure nothing is.
@@ -46,7 +48,7 @@ private:
     void leaveUndecided(const TagMap& image, const char* reason);
     Result openCatalogue();
 
-    const TagFile& mFormer;
+    const QMap<QByteArray, TagMap*>& mFormer;
     const BuildCorrections& mKnown;
     const QSet<QByteArray> mListed;
     std::unique_ptr<Kxg::Catalogue> mCatalogue;

@@ -1,6 +1,6 @@
 #include "kddlib/tagfile/qa/BuildCorrections.h"
 
-#include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagfile/StudyTree.h"
 #include "platform/base/LogFile.h"
 #include "platform/database/Kxg.h"
 
@@ -17,6 +17,7 @@ namespace
 /// All SOP Instance UIDs that an image had before the one that it has now.
 QSet<QByteArray> formerUIDs(const Kxg::ImageCorrection& correction)
 {
+    // Also those between two corrections: a volume file names its images as they were when it was made.
     QSet<QByteArray> uids = {correction.image};
     QVector<AuditEntry> entries;
     logOf(correction).decode(entries);
@@ -95,7 +96,8 @@ bool BuildCorrections::applyTo(TagMap& image, const QByteArray& path) const
 bool BuildCorrections::applyToFormer(TagMap& image) const
 {
     AuditLog log;
-    const QByteArray key = TagFile::imageKey(image);
+    const QByteArray key = StudyTree::imageKey(image);
+    // By its log first: what stands under this name may be the image that a correction put in front of another.
     const Kxg::ImageCorrection* known = log.read(image) ? findShown(key, log) : nullptr;
     if (known == nullptr)
         known = find({mStudyUID, key});

@@ -173,30 +173,31 @@ bool auditTime(const QByteArray& timestamp, QString& time)
     return true;
 }
 
-QString refusalOf(const QAData& job)
+Result check(const QAData& job)
 {
     QString unused;
     if (job.studyUID.isEmpty())
-        return QStringLiteral("The job names no study");
+        return Result::failure(QStringLiteral("The job names no study"));
     if (!auditTime(job.timestamp, unused))
-        return QStringLiteral("Timestamp \"%1\" is no time of the form yyyyMMddhhmmss")
-            .arg(QString::fromLatin1(job.timestamp));
+        return Result::failure(QStringLiteral("Timestamp \"%1\" is no time of the form yyyyMMddhhmmss")
+                                   .arg(QString::fromLatin1(job.timestamp)));
     if (!isOneLine(QString::fromLatin1(job.login)))
-        return QStringLiteral("The login is not one line of text");
+        return Result::failure(QStringLiteral("The login is not one line of text"));
     for (const QASubstitution& each : job.substitutions) {
         const DcmTagKey& key = each.key;
         if (each.value.isNull() && key != DCM_PixelData)
-            return QStringLiteral("Tag %1 has no value").arg(keyName(key));
+            return Result::failure(QStringLiteral("Tag %1 has no value").arg(keyName(key)));
         if (isIdentity(key) && !isUid(each.value))
-            return QStringLiteral("Tag %1: \"%2\" is no UID").arg(keyName(key), each.value);
+            return Result::failure(QStringLiteral("Tag %1: \"%2\" is no UID").arg(keyName(key), each.value));
         if (key == DCM_StudyInstanceUID && each.value != QString::fromLatin1(job.studyUID))
-            return QStringLiteral("Tag %1 asks for study %2, but the job is one of study %3")
-                .arg(keyName(key), each.value, QString::fromLatin1(job.studyUID));
+            return Result::failure(QStringLiteral("Tag %1 asks for study %2, but the job is one of study %3")
+                                       .arg(keyName(key), each.value, QString::fromLatin1(job.studyUID)));
         if (key.getGroup() == kOurPublicGroup || key.getGroup() <= 2 || key.getElement() == 0)
-            return QStringLiteral("Tag %1 is no attribute of an image").arg(keyName(key));
+            return Result::failure(QStringLiteral("Tag %1 is no attribute of an image").arg(keyName(key)));
         if (isPrivate(key) && key.getElement() <= 0xff)
-            return QStringLiteral("Tag %1 reserves a private block, which gives others their meaning")
-                .arg(keyName(key));
+            return Result::failure(
+                QStringLiteral("Tag %1 reserves a private block, which gives others their meaning")
+                    .arg(keyName(key)));
     }
     return {};
 }
@@ -218,7 +219,7 @@ bool QAEditor::hasChanged(const DcmTagKey& key) const
                        [&](const AuditChange& change) { return change.key == key; });
 }
 
-QString QAEditor::substitute(const QASubstitution& substitution)
+Result QAEditor::substitute(const QASubstitution& substitution)
 {
     const DcmTagKey& key = substitution.key;
     if (key == DCM_PixelData) {
@@ -226,36 +227,38 @@ QString QAEditor::substitute(const QASubstitution& substitution)
         return {};
     }
     const TagElement* shown = mImage.findElement(key);
-    QString reason = refusalOf(key, shown);
+    Result result = check(key, shown);
     TagElement element(vrFor(key, shown), QByteArray());
-    if (reason.isEmpty())
-        reason = encode(substitution.value, element.vr(), element);
-    if (!reason.isEmpty())
-        return QStringLiteral("Tag %1: %2").arg(keyName(key), reason);
+    if (result.good())
+        result = encode(substitution.value, element.vr(), element);
+    if (result.bad())
+        return result.within(QStringLiteral("Tag %1").arg(keyName(key)));
     // Numbers are equal when their bytes are, texts when they say the same: what has no element says nothing.
     const bool isEqual = isTextVr(element.vr()) ? decode(key, mNewCharacterSet) == substitution.value
                          : shown != nullptr     ? shown->value() == element.value()
                                                 : element.value().isEmpty();
     if (isEqual)
         return {};
+    // Only now: a value that is there already is not judged, so that a job that was done can be run again.
     const QByteArray odd = firstOddValue(element.vr(), element.value());
     if (!odd.isEmpty())
-        return QStringLiteral("Tag %1: \"%2\" is no %3 of VR %4")
-            .arg(keyName(key), QString::fromLatin1(odd), QLatin1String(kindOfValue(element.vr())),
-                 QLatin1String(vrName(element.vr())));
+        return Result::failure(QStringLiteral("Tag %1: \"%2\" is no %3 of VR %4")
+                                   .arg(keyName(key), QString::fromLatin1(odd),
+                                        QLatin1String(kindOfValue(element.vr())),
+                                        QLatin1String(vrName(element.vr()))));
     mChanges.append({key, decode(key, mOldCharacterSet), substitution.value});
     mImage.putAndInsertValue(key, element.vr(), element.value());
     return {};
 }
 
-QString QAEditor::refusalOf(const DcmTagKey& key, const TagElement* shown) const
+Result QAEditor::check(const DcmTagKey& key, const TagElement* shown) const
 {
     if (shown != nullptr && shown->markedAsOmitted())
-        return QStringLiteral(
-            "the present value is too long to be kept, so it could not be told what it was");
+        return Result::failure(
+            QStringLiteral("the present value is too long to be kept, so it could not be told what it was"));
     const char* creator = mImage.privateCreator(key);
     if (creator != nullptr && qstrcmp(creator, kOurPrivateCreator) == 0)
-        return QStringLiteral("it is no attribute of an image");
+        return Result::failure(QStringLiteral("it is no attribute of an image"));
     return {};
 }
 
@@ -266,28 +269,30 @@ VrCode QAEditor::vrFor(const DcmTagKey& key, const TagElement* shown) const
     return isKnown ? shown->vr() : dictionaryVr(key, mImage.privateCreator(key));
 }
 
-/// Puts the text into the element. An empty text, or why that would not keep all of it.
-QString QAEditor::encode(const QString& text, VrCode vr, TagElement& element) const
+/// Puts the text into the element. Fails when that would not keep all of it.
+Result QAEditor::encode(const QString& text, VrCode vr, TagElement& element) const
 {
     const QByteArray characterSet = takesCharacterSet(vr) ? mNewCharacterSet : QByteArray();
     QByteArray bytes = text.toLatin1();
     const bool isAscii = std::all_of(text.begin(), text.end(), [](QChar c) { return c.unicode() < 0x80; });
     if (!takesCharacterSet(vr) && !isAscii)
-        return QStringLiteral("\"%1\" has other characters than its VR %2 may have")
-            .arg(text, QLatin1String(vrName(vr)));
+        return Result::failure(QStringLiteral("\"%1\" has other characters than its VR %2 may have")
+                                   .arg(text, QLatin1String(vrName(vr))));
     if (!encodeText(text, characterSet, bytes)) {
         const QString character = firstUnwritable(text, characterSet);
-        return QStringLiteral("\"%1\" (U+%2) cannot be written in the image's character set \"%3\"")
-            .arg(character)
-            .arg(character.toUcs4().value(0), 4, 16, QLatin1Char('0'))
-            .arg(QString::fromLatin1(characterSet));
+        return Result::failure(
+            QStringLiteral("\"%1\" (U+%2) cannot be written in the image's character set \"%3\"")
+                .arg(character)
+                .arg(character.toUcs4().value(0), 4, 16, QLatin1Char('0'))
+                .arg(QString::fromLatin1(characterSet)));
     }
     if (!element.putValueAsString(bytes))
-        return QStringLiteral("a value of VR %1 cannot be replaced by a text").arg(QLatin1String(vrName(vr)));
+        return Result::failure(
+            QStringLiteral("a value of VR %1 cannot be replaced by a text").arg(QLatin1String(vrName(vr))));
     const QByteArray misfit = isTextVr(vr) ? QByteArray() : firstMisfit(vr, bytes);
     if (!misfit.isEmpty())
-        return QStringLiteral("\"%1\" is no number of VR %2")
-            .arg(QString::fromLatin1(misfit), QLatin1String(vrName(vr)));
+        return Result::failure(QStringLiteral("\"%1\" is no number of VR %2")
+                                   .arg(QString::fromLatin1(misfit), QLatin1String(vrName(vr))));
     return {};
 }
 

@@ -3,6 +3,7 @@
 #include "kddlib/tagfile/qa/QAAudit.h"
 #include "kddlib/tagfile/qa/QAData.h"
 #include "kddlib/tagmodel/VrCode.h"
+#include "platform/base/Result.h"
 
 namespace Kdd
 {
@@ -20,8 +21,8 @@ bool isOneLine(const QString& text);
 /// it is no time of the form "yyyyMMddhhmmss", which a fraction of the second and a time zone may follow.
 bool auditTime(const QByteArray& timestamp, QString& time);
 
-/// Why the job can be applied to no image at all; empty when nothing speaks against it.
-QString refusalOf(const QAData& job);
+/// Whether anything speaks against the job, so that it can be applied to no image at all.
+Result check(const QAData& job);
 
 /// Replaces values of one image and notes what it has changed. The image must outlive the editor.
 class QAEditor
@@ -30,17 +31,17 @@ public:
     /// Texts are written in the character set that the image has when the whole job is done.
     QAEditor(TagMap& image, const QVector<QASubstitution>& job);
 
-    /// Gives the image the value, unless it has it already. An empty text, or why it cannot be done without losing
-    /// something; the image is as it was then.
-    QString substitute(const QASubstitution& substitution);
+    /// Gives the image the value, unless it has it already. Fails, with the image as it was, when it cannot be done
+    /// without losing something.
+    Result substitute(const QASubstitution& substitution);
 
     const QVector<AuditChange>& changes() const { return mChanges; }
     bool hasChanged(const DcmTagKey& key) const;
 
 private:
-    QString refusalOf(const DcmTagKey& key, const TagElement* shown) const;
+    Result check(const DcmTagKey& key, const TagElement* shown) const;
     VrCode vrFor(const DcmTagKey& key, const TagElement* shown) const;
-    QString encode(const QString& text, VrCode vr, TagElement& element) const;
+    Result encode(const QString& text, VrCode vr, TagElement& element) const;
     QString decode(const DcmTagKey& key, const QByteArray& characterSet) const;
 
     TagMap& mImage;

@@ -1,13 +1,14 @@
 #include "kddlib/tagfile/qa/QAJob.h"
 
 #include "kddlib/tagfile/NodeAttributes.h"
+#include "kddlib/tagfile/SeriesLabels.h"
+#include "kddlib/tagfile/qa/QAEditor.h"
+#include "kddlib/tagfile/qa/QAVolumes.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
 #include "platform/base/Stopwatch.h"
-#include "platform/os/ExclusiveFile.h"
-#include "platform/os/JournaledWrite.h"
 
 #include <dcmtk/dcmdata/dcdeftag.h>
 
@@ -20,11 +21,12 @@ namespace
 {
 
 const char* const kCategory = "TagFileQA";
-const char* const kInBothStudies = "; until the job is run again its images may stand in both studies";
+const char* const kInBothStudies = "until the job is run again its images may stand in both studies";
 
-bool isLabelled(const TagMap* series)
+/// A failure with what it leaves behind.
+Result leaving(const QString& reason, const QString& left)
 {
-    return series->findElement(kAbstract) != nullptr;
+    return Result::failure(reason + QStringLiteral("; ") + left);
 }
 
 /// Whether an image inherits what the node holds.
@@ -48,108 +50,8 @@ void forgetMarkersBelow(const TagMap& node, const DcmTagKey& key)
     }
 }
 
-}  // namespace
-
-bool TagFile::applyQA(QAData& job, QString& message)
-{
-    return QAJob(job, message).run();
-}
-
-TagFile::QAJob::~QAJob()
-{
-    // What was made to be held and was not needed goes again before anyone else can open it.
-    if (mDestination.mCacheFile.isOpen() && mDestination.mCacheFile.size() == 0)
-        removeLocked(mDestination.mCacheFile, mDestination.mCacheFilePath);
-}
-
-bool TagFile::QAJob::run()
-{
-    const Stopwatch total;
-    if (!prepare() || !claim() || !hold())
-        return false;
-    const int readMs = total.elapsed();
-    const auto hasLabels = [](const TagFile& file) {
-        return std::any_of(file.mSeries.cbegin(), file.mSeries.cend(), isLabelled);
-    };
-    mSourceHasLabels = hasLabels(mSource);
-    mDestinationHasLabels = hasLabels(mDestination.isEmpty() ? mSource : mDestination);
-    if (!applyToImages())
-        return false;
-    const Stopwatch writing;
-    if ((mJob.outcome.changed > 0 || mJob.outcome.moved > 0) && !write())
-        return false;
-    const int optimiseMs = mDestination.mStatistics.optimiseMs;
-    if (debugOption(kTimings)) {
-        LogFile::tracef(
-            1, kCategory, "%s: Total=%d Read=%d Optimize=%d Write=%d (%d images, %d changed, %d not found)",
-            mIsMove ? "Move" : "Edit", total.elapsed(), readMs, optimiseMs, writing.elapsed() - optimiseMs,
-            mJob.images.size(), mJob.outcome.changed, mJob.outcome.notFound.size());
-    }
-    return true;
-}
-
-bool TagFile::QAJob::prepare()
-{
-    mJob.outcome = {};
-    mMessage.clear();
-    if (mJob.oldStudyUID == mJob.studyUID)
-        mJob.oldStudyUID.clear();
-    mIsMove = !mJob.oldStudyUID.isEmpty();
-    const QString reason = refusalOf(mJob);
-    if (!reason.isEmpty())
-        return fail(reason);
-    auditTime(mJob.timestamp, mTime);
-    if (!mJob.login.isEmpty())
-        mTime += QLatin1Char(' ') + QString::fromLatin1(mJob.login);
-    mReordersImages =
-        std::any_of(mJob.substitutions.cbegin(), mJob.substitutions.cend(), [](const QASubstitution& each) {
-            return movesImages(each.key) || each.key == DCM_InstanceNumber;
-        });
-    return true;
-}
-
-// ---- holding the studies
-
-/// Whoever builds a study claims it first and holds its file then.
-bool TagFile::QAJob::claim()
-{
-    QString reason;
-    const QARecord::Answer answer = mRecord.claim(mJob, reason);
-    mJob.outcome.isLockedOut = answer == QARecord::Answer::Later;
-    return answer == QARecord::Answer::Done || fail(reason);
-}
-
-/// All hold the files in the same order: two that each have what the other waits for would both give up.
-bool TagFile::QAJob::hold()
-{
-    if (!mIsMove)
-        return hold(mDestination, mJob.studyUID, IfAbsent::Fail);
-    const bool isSourceFirst = cacheFilePathForStudy(mJob.oldStudyUID.constData()) <
-                               cacheFilePathForStudy(mJob.studyUID.constData());
-    if (isSourceFirst && !hold(mSource, mJob.oldStudyUID, IfAbsent::Fail))
-        return false;
-    // A study that is new is made at once, for others may be about to make it as well.
-    if (!hold(mDestination, mJob.studyUID, IfAbsent::Create))
-        return false;
-    mDestination.mCacheFile.seek(0);
-    mBefore = mDestination.mCacheFile.readAll();
-    return isSourceFirst || hold(mSource, mJob.oldStudyUID, IfAbsent::Fail);
-}
-
-bool TagFile::QAJob::hold(TagFile& file, const QByteArray& studyUID, IfAbsent ifAbsent)
-{
-    if (file.holdStudy(studyUID, ifAbsent))
-        return true;
-    mJob.outcome.isLockedOut = file.wasLockedOut();
-    return fail(QStringLiteral("The tag file of study %1 cannot be changed: %2")
-                    .arg(QString::fromLatin1(studyUID),
-                         file.wasLockedOut() ? QStringLiteral("others hold it") : file.failure()));
-}
-
-// ---- writing
-
 /// Removes what a node holds and no image below shows: it belonged to images that left.
-void TagFile::forgetUnseen(TagMap& node)
+void forgetUnseen(TagMap& node)
 {
     const QList<DcmTagKey> keys = node.tagsForLevel().keys();
     for (const DcmTagKey& key : keys) {
@@ -161,79 +63,183 @@ void TagFile::forgetUnseen(TagMap& node)
     }
 }
 
-void TagFile::QAJob::tidy()
+}  // namespace
+
+QAJob::~QAJob()
 {
+    // What was made to be held and was not needed goes again before anyone else can open it.
+    mDestination.file().removeIfNeverWritten();
+}
+
+Result QAJob::run()
+{
+    const Stopwatch total;
+    Result result = prepare();
+    if (result.good())
+        result = claim();
+    if (result.good())
+        result = hold();
+    if (result.bad())
+        return result;
+    const int readMs = total.elapsed();
+    mSourceHasLabels = hasLabels(mSource.tree());
+    mDestinationHasLabels = hasLabels(mDestination.tree().isEmpty() ? mSource.tree() : mDestination.tree());
+    result = applyToImages();
+    const Stopwatch writing;
+    if (result.good() && (mJob.outcome.changed > 0 || mJob.outcome.moved > 0))
+        result = write();
+    if (result.bad())
+        return result;
+    const int optimiseMs = mDestination.figures().optimiseMs;
+    if (TagFileSettings::debugOption(TagFileSettings::kTimings)) {
+        LogFile::tracef(
+            1, kCategory, "%s: Total=%d Read=%d Optimize=%d Write=%d (%d images, %d changed, %d not found)",
+            mIsMove ? "Move" : "Edit", total.elapsed(), readMs, optimiseMs, writing.elapsed() - optimiseMs,
+            mJob.images.size(), mJob.outcome.changed, mJob.outcome.notFound.size());
+    }
+    return {};
+}
+
+Result QAJob::prepare()
+{
+    mJob.outcome = {};
+    if (mJob.oldStudyUID == mJob.studyUID)
+        mJob.oldStudyUID.clear();
+    mIsMove = !mJob.oldStudyUID.isEmpty();
+    Result result = check(mJob);
+    if (result.bad())
+        return result;
+    auditTime(mJob.timestamp, mTime);
+    if (!mJob.login.isEmpty())
+        mTime += QLatin1Char(' ') + QString::fromLatin1(mJob.login);
+    mReordersImages =
+        std::any_of(mJob.substitutions.cbegin(), mJob.substitutions.cend(), [](const QASubstitution& each) {
+            return movesImages(each.key) || each.key == DCM_InstanceNumber;
+        });
+    return result;
+}
+
+// ---- holding the studies
+
+/// Whoever builds a study claims it first and holds its file then.
+Result QAJob::claim()
+{
+    const Result result = mRecord.claim(mJob);
+    mJob.outcome.isLockedOut = mRecord.wasLockedOut();
+    return result;
+}
+
+/// All hold the files in the same order: two that each have what the other waits for would both give up.
+Result QAJob::hold()
+{
+    if (!mIsMove)
+        return hold(mDestination, mJob.studyUID, IfAbsent::Fail);
+    const bool isSourceFirst = TagFileSettings::cacheFilePathForStudy(mJob.oldStudyUID.constData()) <
+                               TagFileSettings::cacheFilePathForStudy(mJob.studyUID.constData());
+    Result result;
+    if (isSourceFirst)
+        result = hold(mSource, mJob.oldStudyUID, IfAbsent::Fail);
+    // A study that is new is made at once, for others may be about to make it as well.
+    if (result.good())
+        result = hold(mDestination, mJob.studyUID, IfAbsent::Create);
+    if (result.bad())
+        return result;
+    mBefore = mDestination.file().content();
+    return isSourceFirst ? result : hold(mSource, mJob.oldStudyUID, IfAbsent::Fail);
+}
+
+Result QAJob::hold(StoredStudy& study, const QByteArray& studyUID, IfAbsent ifAbsent)
+{
+    const Result held = study.hold(studyUID, ifAbsent);
+    if (held.good())
+        return held;
+    mJob.outcome.isLockedOut = study.wasLockedOut();
+    return held.within(
+        QStringLiteral("The tag file of study %1 cannot be changed").arg(QString::fromLatin1(studyUID)));
+}
+
+// ---- writing
+
+void QAJob::tidy()
+{
+    // Volumes first: they may give images to a series that is empty so far.
     for (auto& each : mMoves)
-        mDestination.updateVolumesAfterQA(each.second);
-    mSource.deleteEmptyNodes();
-    mDestination.deleteEmptyNodes();
+        QAVolumes::giveBack(mDestination.tree(), each.second);
+    mSource.tree().deleteEmptyNodes();
+    mDestination.tree().deleteEmptyNodes();
     for (const Series& each : mLeft) {
         if (TagMap* series = each.first->findSeries(each.second))
             forgetUnseen(*series);
         if (each.first->study() != nullptr)
             forgetUnseen(*each.first->study());
     }
-    // Labels are distinct only among the series that were there when they were made.
     if (!mLeft.empty() && mDestinationHasLabels)
-        mDestination.createAbstractTags();
+        createLabels(mDestination.tree());
     if (!mLeft.empty() && mSourceHasLabels)
-        mSource.createAbstractTags();
+        createLabels(mSource.tree());
     mDestination.optimizeAll();
 }
 
-bool TagFile::QAJob::record()
+Result QAJob::record()
 {
-    QString reason;
-    const QARecord::Answer answer = mRecord.record(reason);
-    mJob.outcome.isLockedOut = answer == QARecord::Answer::Later;
-    return answer == QARecord::Answer::Done || fail(reason);
+    const Result result = mRecord.record();
+    mJob.outcome.isLockedOut = mRecord.wasLockedOut();
+    return result;
 }
 
 /// The image database comes first: what it knows the next build makes, whatever becomes of this process. Of the files
 /// the destination comes first: at every moment each image stands in the one study, in the other or in both.
-bool TagFile::QAJob::write()
+Result QAJob::write()
 {
     tidy();
-    if (!record())
-        return false;
-    QFile& file = mDestination.mCacheFile;
-    const QString& path = mDestination.mCacheFilePath;
-    if (!mDestination.isEmpty() && !mDestination.writeInto(file, path, false)) {
-        if (mIsMove && hasJournal(path))
-            return fail(mDestination.failure() + QLatin1String(kInBothStudies));
-        return failWriting(mDestination.failure());
+    Result result = record();
+    if (result.bad())
+        return result;
+    if (!mDestination.tree().isEmpty())
+        result = mDestination.writeHeld();
+    if (result.bad()) {
+        // A journal is a promise: whoever opens the destination next gives it the images that the source still has.
+        const bool isPromised = mIsMove && mDestination.file().hasJournal();
+        return isPromised ? leaving(result.text(), QLatin1String(kInBothStudies))
+                          : failWriting(result.text());
     }
-    if (mIsMove && mSource.isEmpty()) {
-        if (!mSource.writeCacheFile())
-            return fail(mSource.failure() + QLatin1String(kInBothStudies));
-    } else if (mIsMove && !mSource.writeInto(mSource.mCacheFile, mSource.mCacheFilePath, false)) {
-        const QString failure = mSource.failure();
-        const QString left = takeBack();
-        return left.isEmpty() ? failWriting(failure) : fail(failure + left);
-    }
-    mRecord.finish(mDestination, mJob.studyUID);
     if (mIsMove)
-        mRecord.finish(mSource, mJob.oldStudyUID);
-    return true;
+        result = writeSource();
+    if (result.bad())
+        return result;
+    mRecord.finish(mDestination.tree(), mDestination.stamp(), mJob.studyUID);
+    if (mIsMove)
+        mRecord.finish(mSource.tree(), mSource.stamp(), mJob.oldStudyUID);
+    return result;
+}
+
+Result QAJob::writeSource()
+{
+    const bool isEmpty = mSource.tree().isEmpty();
+    const Result written = isEmpty ? mSource.write() : mSource.writeHeld();
+    if (written.good())
+        return written;
+    // Of a file that the system would not remove nobody knows whether it is gone.
+    if (isEmpty || !takeBack())
+        return leaving(written.text(), QLatin1String(kInBothStudies));
+    return failWriting(written.text());
 }
 
 /// With the files as they were.
-bool TagFile::QAJob::failWriting(const QString& reason)
+Result QAJob::failWriting(const QString& reason)
 {
-    return fail(reason + mRecord.takeBack());
+    const Result takenBack = mRecord.takeBack();
+    return takenBack.good() ? Result::failure(reason) : leaving(reason, takenBack.text());
 }
 
 /// Makes the destination what it was, because the source could not be written. But what the source has a journal for
-/// is a promise, and its images will leave it. Empty, or where the images stand then.
-QString TagFile::QAJob::takeBack()
+/// is a promise, and its images will leave it. False when the images stand in both studies then.
+bool QAJob::takeBack()
 {
-    QFile& file = mDestination.mCacheFile;
-    const QString& path = mDestination.mCacheFilePath;
-    if (hasJournal(mSource.mCacheFilePath))
-        return QLatin1String(kInBothStudies);
-    const QString reason = mBefore.isEmpty() ? removeWithJournal(file, path)
-                                             : writeInPlace(file, path, mBefore, {flushing(), Tail::Cut});
-    return QLatin1String(reason.isEmpty() ? "" : kInBothStudies);
+    StudyFile& file = mDestination.file();
+    if (mSource.file().hasJournal())
+        return false;
+    return (mBefore.isEmpty() ? file.remove() : file.write(mBefore, Tail::Cut)).good();
 }
 
 }  // namespace Kdd

@@ -1,7 +1,7 @@
 #pragma once
 
-#include "kddlib/tagfile/TagFile.h"
-#include "kddlib/tagfile/qa/QAEditor.h"
+#include "kddlib/tagfile/StoredStudy.h"
+#include "kddlib/tagfile/qa/QAData.h"
 #include "kddlib/tagfile/qa/QARecord.h"
 #include "kddlib/tagfile/qa/QASeriesMove.h"
 
@@ -17,12 +17,12 @@ namespace Kdd
 bool movesImages(const DcmTagKey& key);
 
 /// One run of a job over the files that it concerns. All of it happens in memory; the files are written at the end.
-class TagFile::QAJob
+class QAJob
 {
 public:
-    QAJob(QAData& job, QString& message)
+    /// The job must outlive the object. What the run did is told in its outcome.
+    explicit QAJob(QAData& job)
         : mJob(job)
-        , mMessage(message)
     {
     }
 
@@ -30,7 +30,9 @@ public:
     QAJob(const QAJob&) = delete;
     QAJob& operator=(const QAJob&) = delete;
 
-    bool run();
+    /// On failure both files are as they were, but for one case that the reason tells: a move whose images stand in both
+    /// studies. As after the death of the process in the middle, running the job again completes it.
+    Result run();
 
 private:
     /// The correction of one image.
@@ -49,53 +51,47 @@ private:
         }
     };
 
-    using Series = std::pair<TagFile*, QByteArray>;
+    using Series = std::pair<StudyTree*, QByteArray>;
 
-    bool prepare();
-    bool hold();
-    bool hold(TagFile& file, const QByteArray& studyUID, IfAbsent ifAbsent);
+    Result prepare();
+    Result hold();
+    Result hold(StoredStudy& study, const QByteArray& studyUID, IfAbsent ifAbsent);
 
-    bool applyToImages();
-    bool applyTo(const QByteArray& key);
-    bool applyTo(TagMap& image, const QByteArray& key);
-    QString substitute(Edit& edit) const;
-    bool note(Edit& edit);
+    Result applyToImages();
+    Result applyTo(const QByteArray& key);
+    Result applyTo(TagMap& image, const QByteArray& key);
+    Result substitute(Edit& edit) const;
+    Result note(Edit& edit);
     void renewPreview(const Edit& edit);
 
     enum class There { Nothing, Another, TheSame };
 
-    void keep(const Edit& edit, const TagFile& holder, const QByteArray& keyNow, There there);
-    bool move(const Edit& edit);
+    void keep(const Edit& edit, const StudyTree& holder, const QByteArray& keyNow, There there);
+    Result move(const Edit& edit);
     bool isMovedAlready(const Edit& edit, const TagMap& there) const;
     void dropFromOrigin(const Edit& edit);
-    bool place(const Edit& edit, TagFile& target, const QByteArray& newKey);
-    QASeriesMove* takeVolumes(TagFile& file, TagMap& series);
+    Result place(const Edit& edit, StudyTree& target, const QByteArray& newKey);
+    QASeriesMove* takeVolumes(StudyTree& tree, TagMap& series);
 
     void tidy();
-    bool claim();
-    bool record();
-    bool write();
-    bool failWriting(const QString& reason);
-    QString takeBack();
+    Result claim();
+    Result record();
+    Result write();
+    Result writeSource();
+    Result failWriting(const QString& reason);
+    bool takeBack();
 
-    bool fail(const QString& reason)
+    static Result failAt(const QByteArray& key, const QString& reason)
     {
-        mMessage = reason;
-        return false;
+        return Result::failure(reason).within(QStringLiteral("Image %1").arg(QString::fromLatin1(key)));
     }
 
-    bool failAt(const QByteArray& key, const QString& reason)
-    {
-        return fail(QStringLiteral("Image %1: %2").arg(QString::fromLatin1(key), reason));
-    }
-
-    TagFile& origin() { return mIsMove ? mSource : mDestination; }
+    StudyTree& origin() { return mIsMove ? mSource.tree() : mDestination.tree(); }
 
     QARecord mRecord;  // outlives the files: its claims go last
-    TagFile mDestination;
-    TagFile mSource;
+    StoredStudy mDestination;
+    StoredStudy mSource;
     QAData& mJob;
-    QString& mMessage;
     bool mIsMove = false;
     bool mSourceHasLabels = false;
     bool mDestinationHasLabels = false;  // or a new one is to have them

@@ -1,12 +1,13 @@
 #include "kddlib/Limits.h"
+#include "kddlib/tagfile/StudyPreviews.h"
 #include "kddlib/tagfile/qa/ImageIdentity.h"
+#include "kddlib/tagfile/qa/QAEditor.h"
 #include "kddlib/tagfile/qa/QAJob.h"
 #include "kddlib/tagfile/qa/QAVolumes.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
-#include "platform/os/PathName.h"
 
 #include <dcmtk/dcmdata/dcdeftag.h>
 
@@ -38,67 +39,72 @@ bool movesImages(const DcmTagKey& key)
     return key == DCM_StudyInstanceUID || key == DCM_SeriesInstanceUID || key == DCM_SOPInstanceUID;
 }
 
-bool TagFile::QAJob::applyToImages()
+Result QAJob::applyToImages()
 {
-    return std::all_of(mJob.images.cbegin(), mJob.images.cend(),
-                       [this](const QByteArray& key) { return applyTo(key); });
+    Result result;
+    for (auto key = mJob.images.cbegin(); key != mJob.images.cend() && result.good(); ++key)
+        result = applyTo(*key);
+    return result;
 }
 
-bool TagFile::QAJob::applyTo(const QByteArray& key)
+Result QAJob::applyTo(const QByteArray& key)
 {
     TagMap* image = origin().findImage(key);
     if (image != nullptr)
         return applyTo(*image, key);
     // What an earlier run has moved is not missing.
-    if (!mIsMove || mDestination.findImage(key) == nullptr)
+    if (!mIsMove || mDestination.tree().findImage(key) == nullptr)
         mJob.outcome.notFound.append(key);
-    return true;
+    return {};
 }
 
-bool TagFile::QAJob::applyTo(TagMap& image, const QByteArray& key)
+Result QAJob::applyTo(TagMap& image, const QByteArray& key)
 {
     Edit edit = {image, key, image.uid(TagMap::SeriesLevel), {}, {}};
+    // What a damaged log told could not be told again, so nothing may be written in its place.
     if (!edit.before.read(image))
         return failAt(key, QStringLiteral("its audit log is damaged"));
     if (mReordersImages)
         takeVolumes(origin(), *image.parent());
-    const QString reason = substitute(edit);
-    if (!reason.isEmpty())
-        return failAt(key, reason);
+    Result result = substitute(edit);
+    if (result.bad())
+        return failAt(key, result.text());
     if (edit.changes.isEmpty())
-        return true;
-    if (!note(edit))
-        return false;
+        return result;
+    result = note(edit);
+    if (result.bad())
+        return result;
     const bool isMoved = std::any_of(edit.changes.cbegin(), edit.changes.cend(),
                                      [](const AuditChange& change) { return movesImages(change.key); });
     if (isMoved)
         return move(edit);
     keep(edit, origin(), key, There::Nothing);
-    return true;
+    return result;
 }
 
-QString TagFile::QAJob::substitute(Edit& edit) const
+Result QAJob::substitute(Edit& edit) const
 {
     QAEditor editor(edit.image, mJob.substitutions);
-    QString reason;
-    for (int i = 0; i < mJob.substitutions.size() && reason.isEmpty(); ++i)
-        reason = editor.substitute(mJob.substitutions.at(i));
+    Result result;
+    for (int i = 0; i < mJob.substitutions.size() && result.good(); ++i)
+        result = editor.substitute(mJob.substitutions.at(i));
     // Whoever moves a series to a study need not say that its images then belong to that study.
-    if (reason.isEmpty() && mIsMove && editor.hasChanged(DCM_SeriesInstanceUID))
-        reason = editor.substitute({DCM_StudyInstanceUID, QString::fromLatin1(mJob.studyUID)});
+    if (result.good() && mIsMove && editor.hasChanged(DCM_SeriesInstanceUID))
+        result = editor.substitute({DCM_StudyInstanceUID, QString::fromLatin1(mJob.studyUID)});
     for (const AuditChange& change : editor.changes()) {
         // Pixels cannot be looked at, so only the log tells that this job was here before.
         if (change.key != DCM_PixelData || !isNoted(edit.before, mTime, change))
             edit.changes.append(change);
     }
-    return reason;
+    return result;
 }
 
 /// Tells the changes in the image's audit log.
-bool TagFile::QAJob::note(Edit& edit)
+Result QAJob::note(Edit& edit)
 {
     AuditLog log = edit.before;
     log.append({mTime, edit.changes});
+    // Found out here and not at the end, before logs of many images have taken the memory.
     mLogBytes += log.text().size();
     if (mLogBytes > kMaxBodySize)
         return failAt(edit.key, QStringLiteral("the audit logs become too long to be stored"));
@@ -109,13 +115,13 @@ bool TagFile::QAJob::note(Edit& edit)
     ++mJob.outcome.changed;
     if (edit.hasChanged(DCM_PixelData) && edit.image.findElement(kPreview) != nullptr)
         renewPreview(edit);
-    return true;
+    return {};
 }
 
 /// A picture of what was corrected away is worse than none.
-void TagFile::QAJob::renewPreview(const Edit& edit)
+void QAJob::renewPreview(const Edit& edit)
 {
-    if (origin().addPreview(origin().findImage(edit.key), filePathOf(edit.image)))
+    if (addPreview(&edit.image, filePathOf(edit.image)))
         return;
     edit.image.deleteElement(kPreview);
     if (edit.image.findElement(kPreview) != nullptr)
@@ -125,23 +131,23 @@ void TagFile::QAJob::renewPreview(const Edit& edit)
 // ---- moving
 
 /// Takes the volumes out of a series, once. Null when it has none.
-QASeriesMove* TagFile::QAJob::takeVolumes(TagFile& file, TagMap& series)
+QASeriesMove* QAJob::takeVolumes(StudyTree& tree, TagMap& series)
 {
-    const Series key(&file, series.uid(TagMap::SeriesLevel));
+    const Series key(&tree, series.uid(TagMap::SeriesLevel));
     const auto found = mMoves.find(key);
     if (found != mMoves.end())
         return &found->second;
     if (series.volumes().isEmpty())
         return nullptr;
-    return &mMoves.emplace(key, QAVolumes::takeOut(file, series)).first->second;
+    return &mMoves.emplace(key, QAVolumes::takeOut(tree, series)).first->second;
 }
 
-bool TagFile::QAJob::move(const Edit& edit)
+Result QAJob::move(const Edit& edit)
 {
     const bool staysInSeries =
         !edit.hasChanged(DCM_StudyInstanceUID) && !edit.hasChanged(DCM_SeriesInstanceUID);
-    TagFile& target = staysInSeries ? origin() : mDestination;
-    const QByteArray newKey = imageKey(edit.image);
+    StudyTree& target = staysInSeries ? origin() : mDestination.tree();
+    const QByteArray newKey = StudyTree::imageKey(edit.image);
     TagMap* there = target.findImage(newKey);
     ++mJob.outcome.moved;
     if (there == nullptr || there == &edit.image) {
@@ -151,7 +157,7 @@ bool TagFile::QAJob::move(const Edit& edit)
     if (isMovedAlready(edit, *there)) {
         keep(edit, target, newKey, There::TheSame);
         dropFromOrigin(edit);
-        return true;
+        return {};
     }
     if (edit.hasChanged(DCM_SOPInstanceUID))
         return failAt(edit.key, QStringLiteral("there is another image %1").arg(QString::fromLatin1(newKey)));
@@ -164,7 +170,7 @@ bool TagFile::QAJob::move(const Edit& edit)
     return place(edit, target, newKey);
 }
 
-void TagFile::QAJob::keep(const Edit& edit, const TagFile& holder, const QByteArray& keyNow, There there)
+void QAJob::keep(const Edit& edit, const StudyTree& holder, const QByteArray& keyNow, There there)
 {
     mRecord.note({mIsMove ? mJob.oldStudyUID : mJob.studyUID, edit.seriesUID, edit.key, edit.before,
                   edit.changes, &holder, keyNow, there == There::TheSame, there == There::Another});
@@ -172,19 +178,19 @@ void TagFile::QAJob::keep(const Edit& edit, const TagFile& holder, const QByteAr
 
 /// An earlier run of the job may have ended when only the destination was written. What happened to the image there
 /// since then stays.
-bool TagFile::QAJob::isMovedAlready(const Edit& edit, const TagMap& there) const
+bool QAJob::isMovedAlready(const Edit& edit, const TagMap& there) const
 {
     AuditLog log;
     return mIsMove && log.read(there) && isContinued(edit.before, edit.changes, log);
 }
 
-void TagFile::QAJob::dropFromOrigin(const Edit& edit)
+void QAJob::dropFromOrigin(const Edit& edit)
 {
     mLeft.insert({&origin(), edit.image.parent()->uid(TagMap::SeriesLevel)});
     delete origin().takeImage(edit.key);
 }
 
-bool TagFile::QAJob::place(const Edit& edit, TagFile& target, const QByteArray& newKey)
+Result QAJob::place(const Edit& edit, StudyTree& target, const QByteArray& newKey)
 {
     TagMap& series = *edit.image.parent();
     const QByteArray seriesUID = series.uid(TagMap::SeriesLevel);
@@ -193,11 +199,11 @@ bool TagFile::QAJob::place(const Edit& edit, TagFile& target, const QByteArray& 
     mLeft.insert({&origin(), seriesUID});
     std::unique_ptr<TagMap> image(origin().takeImage(edit.key));
     image->deleteElement(kVolumeIndex);
-    TagMap* placed = target.addTagMap(image.release(), nullptr, true);
+    const TagMap* placed = target.add(image.release(), nullptr, true);
     if (placed == nullptr)
         return failAt(edit.key,
                       QStringLiteral("study %1 does not take it").arg(QString::fromLatin1(mJob.studyUID)));
-    return true;
+    return {};
 }
 
 }  // namespace Kdd

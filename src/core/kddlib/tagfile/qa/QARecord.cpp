@@ -1,7 +1,8 @@
 #include "kddlib/tagfile/qa/QARecord.h"
 
 #include "kddlib/tagfile/StudyRecord.h"
-#include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagfile/StudyTree.h"
+#include "kddlib/tagfile/TagFileSettings.h"
 #include "kddlib/tagfile/qa/BuildCorrections.h"
 #include "kddlib/tagfile/qa/QAData.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
@@ -21,6 +22,8 @@ namespace
 
 /// As long as tag files are waited for [ms].
 constexpr int kPatience = 400;
+
+const char* const kNotKept = "The correction could not be kept";
 
 /// Whether `log` goes on where the image's log ended before the job, and with these changes.
 bool tellsOf(const QAImageChange& change, const AuditLog& log)
@@ -51,18 +54,20 @@ QARecord::~QARecord()
     }
 }
 
-QARecord::Answer QARecord::claim(const QAData& job, QString& reason)
+Result QARecord::claim(const QAData& job)
 {
     const QByteArray address = Kxg::DatabaseServer();
     if (address.isEmpty())
-        return Answer::Done;
+        return {};
     Result result;
     std::unique_ptr<Kxg::Catalogue> catalogue = Kxg::Catalogue::open(address, result);
     QList<QByteArray> uids = {job.studyUID};
     if (!job.oldStudyUID.isEmpty())
         uids.append(job.oldStudyUID);
+    // The order of the files, so that two jobs that each move images to the other's study do not wait for each other.
     std::sort(uids.begin(), uids.end(), [](const QByteArray& a, const QByteArray& b) {
-        return TagFile::cacheFilePathForStudy(a.constData()) < TagFile::cacheFilePathForStudy(b.constData());
+        return TagFileSettings::cacheFilePathForStudy(a.constData()) <
+               TagFileSettings::cacheFilePathForStudy(b.constData());
     });
     QVector<QByteArray> known;
     for (const QByteArray& uid : qAsConst(uids)) {
@@ -72,29 +77,33 @@ QARecord::Answer QARecord::claim(const QAData& job, QString& reason)
         if (found.contains(uid))
             known.append(uid);
     }
-    if (result.bad()) {
-        reason = QStringLiteral("The correction could not be kept: %1").arg(result.text());
-        return Answer::Refused;
-    }
+    if (result.bad())
+        return result.within(QString::fromLatin1(kNotKept));
     if (known.isEmpty())
-        return Answer::Done;
+        return {};
     mCatalogue = std::move(catalogue);
     for (const QByteArray& uid : qAsConst(uids)) {
         const bool isDestination = uid == job.studyUID;
         if (!isDestination && !known.contains(uid))
             continue;
-        const Answer answer = claimOne(uid, isDestination, reason);
-        if (answer != Answer::Done)
-            return answer;
+        result = claimOne(uid, isDestination);
+        if (result.bad())
+            return result;
         const auto claimed = mStudies.find(uid);
         if (claimed != mStudies.end())
             claimed->second.isMade = !known.contains(uid);
     }
-    return Answer::Done;
+    return {};
+}
+
+Result QARecord::lockedOut(const QString& reason)
+{
+    mIsLockedOut = true;
+    return Result::failure(reason);
 }
 
 /// The destination is made when it is not there. Another study may have lost its last image and be gone meanwhile.
-QARecord::Answer QARecord::claimOne(const QByteArray& studyUID, bool isDestination, QString& reason)
+Result QARecord::claimOne(const QByteArray& studyUID, bool isDestination)
 {
     using Making = Kxg::Catalogue::IfAbsent;
     std::unique_ptr<Kxg::StudyClaim> claim;
@@ -103,18 +112,14 @@ QARecord::Answer QARecord::claimOne(const QByteArray& studyUID, bool isDestinati
         mCatalogue->claim(studyUID, kPatience, claim, isDestination ? Making::Create : Making::Fail);
     const QString study = QString::fromLatin1(studyUID);
     if (result.bad() && mCatalogue->findStudies(studyUID, 1, found).good() && !found.contains(studyUID))
-        return Answer::Done;
-    if (result.bad()) {
-        reason = QStringLiteral("Study %1 cannot be claimed: %2").arg(study, result.text());
-        return Answer::Refused;
-    }
-    if (claim == nullptr) {
-        reason = QStringLiteral("Study %1 is being worked on by another process").arg(study);
-        return Answer::Later;
-    }
+        return {};
+    if (result.bad())
+        return result.within(QStringLiteral("Study %1 cannot be claimed").arg(study));
+    if (claim == nullptr)
+        return lockedOut(QStringLiteral("Study %1 is being worked on by another process").arg(study));
     Study& claimed = mStudies[studyUID];
     claimed.claim = std::move(claim);
-    return Answer::Done;
+    return {};
 }
 
 /// Once the tag files are held.
@@ -129,7 +134,7 @@ Result QARecord::read()
             result = mCatalogue->corrections(each.first, study.corrections);
         const Kxg::TagFileStamp& stamp = study.contents.tagFile;
         study.isRecognised = stamp.digest.isEmpty() ||
-                             isTagFile(TagFile::cacheFilePathForStudy(each.first.constData()), stamp);
+                             isTagFile(TagFileSettings::cacheFilePathForStudy(each.first.constData()), stamp);
     }
     return result;
 }
@@ -209,10 +214,10 @@ bool QARecord::identifyByLog(const QAImageChange& change, Kxg::ImageCorrection& 
 
 // ---- keeping it
 
-QARecord::Answer QARecord::record(QString& reason)
+Result QARecord::record()
 {
     if (mCatalogue == nullptr)
-        return Answer::Done;
+        return {};
     Result result = read();
     for (const QAImageChange& change : mChanges) {
         Kxg::ImageCorrection former;
@@ -225,24 +230,22 @@ QARecord::Answer QARecord::record(QString& reason)
             findShown(change.holder->studyInstanceUID(), change.keyNow, change.before) != nullptr)
             continue;
         if (!identify(change, former)) {
-            reason = QStringLiteral("Image %1: study %2 is to be built first, for its tag file does not "
-                                    "show an earlier correction yet")
-                         .arg(QString::fromLatin1(change.key), QString::fromLatin1(change.studyUID));
+            const QString reason =
+                QStringLiteral("Image %1: study %2 is to be built first, for its tag file does not "
+                               "show an earlier correction yet")
+                    .arg(QString::fromLatin1(change.key), QString::fromLatin1(change.studyUID));
             // It came into being after this job had asked for it: now it can be claimed as well.
             if (mStudies.find(change.studyUID) == mStudies.end())
-                return Answer::Later;
+                return lockedOut(reason);
             mCatalogue->requestBuild({change.studyUID}, Kxg::Catalogue::IfGone::PassOver);
-            return Answer::Refused;
+            return Result::failure(reason);
         }
         result = add(change, former);
         mIsFinal = mIsFinal || change.replacedAnother;
     }
     if (result.good() && !mRecorded.empty())
         result = mCatalogue->recordCorrections(mRecorded, mRequests);
-    if (result.good())
-        return Answer::Done;
-    reason = QStringLiteral("The correction could not be kept: %1").arg(result.text());
-    return Answer::Refused;
+    return result.within(QString::fromLatin1(kNotKept));
 }
 
 Result QARecord::add(const QAImageChange& change, const Kxg::ImageCorrection& former)
@@ -268,25 +271,27 @@ Result QARecord::add(const QAImageChange& change, const Kxg::ImageCorrection& fo
     return {};
 }
 
-QString QARecord::takeBack()
+Result QARecord::takeBack()
 {
     if (mRecorded.empty())
         return {};
     // Files of the image that was replaced would go along.
     if (mIsFinal)
-        return QStringLiteral("; the image database keeps the correction, and the next build makes it");
+        return Result::failure(
+            QStringLiteral("the image database keeps the correction, and the next build makes it"));
     QMap<QByteArray, qint64> requests;
     const Result result = mCatalogue->recordCorrections(mFormer, requests);
     if (result.bad())
-        return QStringLiteral("; the image database keeps the correction (%1), and the next build makes it")
-            .arg(result.text());
+        return Result::failure(
+            QStringLiteral("the image database keeps the correction (%1), and the next build makes it")
+                .arg(result.text()));
     mCatalogue->finishRequests(mRequests.values().toVector() + requests.values().toVector());
     mRequests.clear();
     mRecorded.clear();
     return {};
 }
 
-void QARecord::finish(const TagFile& file, const QByteArray& studyUID)
+void QARecord::finish(const StudyTree& tree, const Kxg::TagFileStamp& stamp, const QByteArray& studyUID)
 {
     const auto found = mStudies.find(studyUID);
     const qint64 request = mRequests.value(studyUID, 0);
@@ -295,8 +300,8 @@ void QARecord::finish(const TagFile& file, const QByteArray& studyUID)
         return;
     Study& study = found->second;
     Result result;
-    if (!file.isEmpty()) {
-        result = study.claim->finishChange(builtStudy(file), request);
+    if (!tree.isEmpty()) {
+        result = study.claim->finishChange(builtStudy(tree.series(), stamp), request);
     } else {
         Kxg::StudyContents left;
         result = mCatalogue->studyContents(studyUID, left);

@@ -16,7 +16,7 @@
 namespace Kdd
 {
 
-class TagFile;
+class StudyTree;
 struct QAData;
 
 /// What a job did to one image.
@@ -28,7 +28,7 @@ struct QAImageChange
     AuditLog before;
     QVector<AuditChange> changes;
 
-    const TagFile* holder = nullptr;  ///< where it stands now; not owned
+    const StudyTree* holder = nullptr;  ///< where it stands now; not owned
     QByteArray keyNow;
     bool wasThereAlready = false;  ///< an earlier run of the job that ended early had brought it there
     bool replacedAnother = false;  ///< an image of the same UID
@@ -41,29 +41,26 @@ struct QAImageChange
 class QARecord
 {
 public:
-    enum class Answer {
-        Done,
-        Refused,  ///< with the reason
-        Later,    ///< the same, but others only have to finish what they do
-    };
-
     ~QARecord();
 
     /// Claims the studies in the order in which tag files are held.
-    Answer claim(const QAData& job, QString& reason);
+    Result claim(const QAData& job);
 
     void note(const QAImageChange& change) { mChanges.push_back(change); }
 
     /// Keeps all that was noted, in one transaction. Not when the database knows of corrections that the tag files do
     /// not show yet.
-    Answer record(QString& reason);
+    Result record();
 
-    /// Makes what `record` did undone. Empty, or why what was recorded stays.
-    QString takeBack();
+    /// Whether `claim` or `record` failed because others only have to finish what they do: then try again.
+    bool wasLockedOut() const { return mIsLockedOut; }
+
+    /// Makes what `record` did undone. On failure what was recorded stays.
+    Result takeBack();
 
     /// To be called for each study when the tag files are written: the study does not wait for what was recorded. A
     /// fault is warned about, for the study is built once more then.
-    void finish(const TagFile& file, const QByteArray& studyUID);
+    void finish(const StudyTree& tree, const Kxg::TagFileStamp& stamp, const QByteArray& studyUID);
 
 private:
     struct Study
@@ -75,7 +72,8 @@ private:
         std::vector<Kxg::ImageCorrection> corrections;
     };
 
-    Answer claimOne(const QByteArray& studyUID, bool isDestination, QString& reason);
+    Result claimOne(const QByteArray& studyUID, bool isDestination);
+    Result lockedOut(const QString& reason);
     Result read();
     bool identify(const QAImageChange& change, Kxg::ImageCorrection& former);
     bool identifyByLog(const QAImageChange& change, Kxg::ImageCorrection& former);
@@ -91,6 +89,7 @@ private:
     std::vector<Kxg::ImageCorrection> mFormer;
     QMap<QByteArray, qint64> mRequests;
     bool mIsFinal = false;  // taking it back would do more than that
+    bool mIsLockedOut = false;
 };
 
 }  // namespace Kdd

@@ -11,6 +11,8 @@
 namespace Kdd
 {
 
+class StudyTree;
+
 /// A series whose images are corrected, with its volumes as they were before. The volumes know their images by UID,
 /// for the images themselves may be replaced.
 struct QASeriesMove
@@ -21,7 +23,7 @@ struct QASeriesMove
         QVector<QByteArray> images;
     };
 
-    TagFile* source = nullptr;  ///< which holds the series; not owned
+    StudyTree* source = nullptr;  ///< which holds the series; not owned
     QByteArray seriesUID;
     std::vector<Stack> stacks;
 

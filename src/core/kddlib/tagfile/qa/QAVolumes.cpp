@@ -1,9 +1,10 @@
 #include "kddlib/tagfile/qa/QAVolumes.h"
 
+#include "kddlib/tagfile/StudyPreviews.h"
+#include "kddlib/tagfile/StudyTree.h"
 #include "kddlib/tagfile/format/VolumeIndex.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
-#include "platform/os/PathName.h"
 
 #include <memory>
 
@@ -37,12 +38,12 @@ int imageOfSlice(const Volume& volume, int slice)
 
 }  // namespace
 
-void TagFile::updateVolumesAfterQA(QASeriesMove& move)
+void QAVolumes::giveBack(StudyTree& destination, QASeriesMove& move)
 {
-    QAVolumes(*this, move).giveBack();
+    QAVolumes(destination, move).giveBack();
 }
 
-QASeriesMove TagFile::QAVolumes::takeOut(TagFile& source, TagMap& series)
+QASeriesMove QAVolumes::takeOut(StudyTree& source, TagMap& series)
 {
     QASeriesMove move;
     move.source = &source;
@@ -50,7 +51,7 @@ QASeriesMove TagFile::QAVolumes::takeOut(TagFile& source, TagMap& series)
     for (const Volume* volume : series.volumes()) {
         QASeriesMove::Stack stack = {*volume, {}};
         for (int i = 0; i < volume->numImages(); ++i)
-            stack.images.append(imageKey(*volume->image(i)));
+            stack.images.append(StudyTree::imageKey(*volume->image(i)));
         // Its slices are to stay as they are while images come and go.
         stack.volume.mImages.set({});
         move.stacks.push_back(stack);
@@ -59,7 +60,7 @@ QASeriesMove TagFile::QAVolumes::takeOut(TagFile& source, TagMap& series)
     return move;
 }
 
-void TagFile::QAVolumes::giveBack()
+void QAVolumes::giveBack()
 {
     if (TagMap* series = mMove.source->findSeries(mMove.seriesUID))
         mTouched.append(series);
@@ -70,7 +71,7 @@ void TagFile::QAVolumes::giveBack()
         renumber(*series);
 }
 
-TagMap* TagFile::QAVolumes::imageNow(const QByteArray& formerKey) const
+TagMap* QAVolumes::imageNow(const QByteArray& formerKey) const
 {
     if (!mMove.movedTo.contains(formerKey))
         return mMove.source->findImage(formerKey);
@@ -79,7 +80,7 @@ TagMap* TagFile::QAVolumes::imageNow(const QByteArray& formerKey) const
     return image != nullptr ? image : mMove.source->findImage(key);
 }
 
-QVector<TagMap*> TagFile::QAVolumes::imagesNow(const QASeriesMove::Stack& stack) const
+QVector<TagMap*> QAVolumes::imagesNow(const QASeriesMove::Stack& stack) const
 {
     QVector<TagMap*> images;
     images.reserve(stack.images.size());
@@ -88,7 +89,7 @@ QVector<TagMap*> TagFile::QAVolumes::imagesNow(const QASeriesMove::Stack& stack)
     return images;
 }
 
-void TagFile::QAVolumes::giveBack(const QASeriesMove::Stack& stack)
+void QAVolumes::giveBack(const QASeriesMove::Stack& stack)
 {
     const QVector<TagMap*> images = imagesNow(stack);
     QVector<TagMap*> holders;
@@ -112,8 +113,7 @@ void TagFile::QAVolumes::giveBack(const QASeriesMove::Stack& stack)
 
 /// What divides a volume leaves gaps between its slices, so nothing is said about the geometry of a part; nor is the
 /// volume file named, which holds all the slices.
-void TagFile::QAVolumes::attach(TagMap* series, const Volume& volume, const QVector<TagMap*>& images,
-                                bool isWhole)
+void QAVolumes::attach(TagMap* series, const Volume& volume, const QVector<TagMap*>& images, bool isWhole)
 {
     auto part = isWhole ? std::make_unique<Volume>(volume) : std::make_unique<Volume>();
     part->attachImages(series->volumes().size(), withoutGaps(images));
@@ -136,7 +136,7 @@ void TagFile::QAVolumes::attach(TagMap* series, const Volume& volume, const QVec
 }
 
 /// Volumes that came together from several series would share their indexes.
-void TagFile::QAVolumes::renumber(TagMap& series)
+void QAVolumes::renumber(TagMap& series)
 {
     for (int i = 0; i < series.volumes().size(); ++i)
         series.volumes().at(i)->mVolumeIndex = i;
@@ -144,22 +144,23 @@ void TagFile::QAVolumes::renumber(TagMap& series)
 }
 
 /// The preview of a volume that is divided shows the image in its middle; it goes on with that one.
-void TagFile::QAVolumes::keepPreview(const Volume& volume, const QVector<TagMap*>& images)
+void QAVolumes::keepPreview(const Volume& volume, const QVector<TagMap*>& images)
 {
     TagMap* shown = images.value(imageOfSlice(volume, volume.dims().z / 2), nullptr);
     if (shown != nullptr && shown->findElement(kPreview) == nullptr)
         shown->putAndInsertValue(kPreview, VrCode::OB, volume.previewData());
 }
 
-void TagFile::QAVolumes::obtainPreview(TagMap& series, const QVector<TagMap*>& images)
+void QAVolumes::obtainPreview(TagMap& series, const QVector<TagMap*>& images)
 {
     const TagMap& middle = *images.at(images.size() / 2);
     const QByteArray path = filePathOf(middle);
     if (path.isEmpty() || !series.findPreviewData(nullptr).isEmpty())
         return;
-    const QByteArray key = imageKey(middle);
-    TagFile& holder = mDestination.findImage(key) == &middle ? mDestination : *mMove.source;
-    holder.addPreview(key, pathText(path));
+    // Found again by its key: the series may be of the one tree or of the other.
+    const QByteArray key = StudyTree::imageKey(middle);
+    const StudyTree& holder = mDestination.findImage(key) == &middle ? mDestination : *mMove.source;
+    addPreview(holder.findImage(key), path);
 }
 
 }  // namespace Kdd

@@ -1,4 +1,7 @@
-#include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagfile/DatabaseSync.h"
+
+#include "kddlib/tagfile/DatabaseValues.h"
+#include "kddlib/tagfile/StoredStudy.h"
 #include "kddlib/tagfile/qa/QAAudit.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
@@ -82,23 +85,21 @@ QVector<QByteArray> volumeNames(const TagMap& series)
 
 const std::vector<Kxg::ImageFile> kNoImages;
 
-}  // namespace
-
 /// What the database lists of a study, in terms of the tree that is held. Corrections are no part of the database: an
 /// image that they gave another UID, series or study is listed as what it was before.
-class TagFile::DatabaseView
+class DatabaseView
 {
 public:
-    DatabaseView(const TagFile& file, const Kxg::DicomDirectoryEntry& study)
+    DatabaseView(const StudyTree& tree, const Kxg::DicomDirectoryEntry& study)
     {
-        const QHash<QByteArray, const TagMap*> renamed = correctedImages(file);
+        const QHash<QByteArray, const TagMap*> renamed = correctedImages(tree);
         for (const Kxg::DicomDirectoryEntry& entry : study.entries) {
             mListed.insert(entry.seriesInstanceUID);
             if (entry.seriesInfo == nullptr)
                 continue;
             mAsked.insert(entry.seriesInstanceUID);
             for (const Kxg::ImageFile& image : entry.seriesInfo->images) {
-                mKnown.insert(file.findImage(image));
+                mKnown.insert(DatabaseValues::findImage(tree, image));
                 mKnown.insert(renamed.value(image.sopInstanceUID, nullptr));
             }
         }
@@ -110,10 +111,10 @@ public:
 
 private:
     /// By the UIDs that they had before. Those of another study are not listed here at all.
-    QHash<QByteArray, const TagMap*> correctedImages(const TagFile& file)
+    QHash<QByteArray, const TagMap*> correctedImages(const StudyTree& tree)
     {
         QHash<QByteArray, const TagMap*> renamed;
-        for (const TagMap* image : file.imagesByUID()) {
+        for (const TagMap* image : tree.images()) {
             AuditLog log;
             QVector<AuditEntry> entries;
             if (!log.read(*image) || log.text().isEmpty() || !log.decode(entries))
@@ -138,9 +139,53 @@ private:
     QSet<const TagMap*> mKnown;
 };
 
-bool TagFile::readAndSync(const char* studyUIDGiven, const char* /*user*/)
+/// Whether a path or a volume's name changed.
+bool syncSeries(StudyTree& tree, TagMap& series, const Kxg::DicomDirectoryEntry& entry)
 {
-    const QByteArray wanted(studyUIDGiven);  // may be that of the study that is held and let go of now
+    bool isChanged = false;
+    for (const Kxg::ImageFile& file : entry.seriesInfo != nullptr ? entry.seriesInfo->images : kNoImages) {
+        const TagMap* image = DatabaseValues::findImage(tree, file);
+        isChanged = isChanged || (image != nullptr && filePathOf(*image) != forwardSlashes(file.path));
+    }
+    bool complete = true;
+    DatabaseValues(tree).addFilePaths(&series, entry.seriesInfo.get(), false, complete);
+    const QVector<QByteArray> names = volumeNames(series);
+    DatabaseValues::addVolumeFilePath(&series, entry, false);
+    for (const Kxg::DicomDirectoryEntry& file : entry.entries)
+        DatabaseValues::addVolumeFilePath(&series, file, false);
+    return isChanged || names != volumeNames(series);
+}
+
+/// Removes the images and series that the database does not list. The path that an image brought along from the building
+/// of the file says nothing of what the database knows.
+bool removeUnlisted(StudyTree& tree, const DatabaseView& view)
+{
+    bool isChanged = false;
+    // A copy, because series go from the index meanwhile.
+    const StudyTree::Nodes held = tree.series();
+    for (auto it = held.cbegin(); it != held.cend(); ++it) {
+        TagMap* series = it.value();
+        const QList<TagMap*> images = series->children();
+        // Of a listed series whose images were not asked for nothing is known.
+        const bool isAsked = !view.lists(it.key()) || view.listsImagesOf(it.key());
+        for (int i = images.size() - 1; i >= 0 && isAsked; --i) {
+            if (view.knows(images.at(i)))
+                continue;
+            tree.dropImage(images.at(i));
+            isChanged = true;
+        }
+        if (view.lists(it.key()) || !series->children().isEmpty())
+            continue;
+        tree.dropSeriesAndEmptyStudy(series);
+        isChanged = true;
+    }
+    return isChanged;
+}
+
+}  // namespace
+
+bool readAndSync(StoredStudy& held, const QByteArray& wanted, Result& read)
+{
     const char* studyUID = wanted.constData();
     Result result = Kxg::StorageManager::retrieveStorageVolumes();
     if (result.bad())
@@ -155,11 +200,13 @@ bool TagFile::readAndSync(const char* studyUIDGiven, const char* /*user*/)
         LogFile::tracef(0, kCategory, "Could not find study %s", studyUID);
         return false;
     }
+    // The database answers while the file is read: both take about as long.
     SeriesQuery query(studyUID);
-    const bool isRead = readWhenFreeForStudy(studyUID, false);
+    read = held.read(TagFileSettings::cacheFilePathForStudy(studyUID), studyUID, false,
+                     StoredStudy::Reader::Serving);
     QMap<QByteArray, std::shared_ptr<Kxg::SeriesInfo>> series;
     result = query.wait(series);
-    if (!isRead) {
+    if (read.bad()) {
         LogFile::tracef(3, kCategory, "Could not read tag file for study %s", studyUID);
         return false;
     }
@@ -171,80 +218,36 @@ bool TagFile::readAndSync(const char* studyUIDGiven, const char* /*user*/)
     // A series of volume files alone is one whose images are gone, not one whose images were not asked for.
     for (Kxg::DicomDirectoryEntry& entry : study->entries)
         entry.seriesInfo = series.value(entry.seriesInstanceUID, std::make_shared<Kxg::SeriesInfo>());
-    syncWithDatabase(study);
+    syncWithDatabase(held.tree(), study);
     return true;
 }
 
-bool TagFile::syncWithDatabase(const std::shared_ptr<Kxg::DicomDirectoryEntry>& study)
+bool syncWithDatabase(StudyTree& tree, const std::shared_ptr<Kxg::DicomDirectoryEntry>& study)
 {
     if (study == nullptr)
         return false;
-    if (!isEmpty() && studyInstanceUID() != study->studyInstanceUID) {
+    if (!tree.isEmpty() && tree.studyInstanceUID() != study->studyInstanceUID) {
         LogFile::errorf("Study %s is not synchronised with what the database says of study %s",
-                        studyInstanceUID().constData(), study->studyInstanceUID.constData());
+                        tree.studyInstanceUID().constData(), study->studyInstanceUID.constData());
         return false;
     }
     if (study->entries.empty()) {
-        copyDatabaseValuesIntoTagMap(*study);
+        DatabaseValues(tree).copyStudy(*study);
         return false;
     }
-    const DatabaseView view(*this, *study);
+    // Before anything changes: an image without UID is found by the path that it has now.
+    const DatabaseView view(tree, *study);
     bool isChanged = false;
     for (const Kxg::DicomDirectoryEntry& entry : study->entries) {
-        if (TagMap* series = findSeries(entry.seriesInstanceUID))
-            isChanged = syncSeries(*series, entry) || isChanged;
+        if (TagMap* series = tree.findSeries(entry.seriesInstanceUID))
+            isChanged = syncSeries(tree, *series, entry) || isChanged;
         else
             LogFile::warnf("Series %s not found in tag map", entry.seriesInstanceUID.constData());
     }
-    isChanged = removeUnlisted(view) || isChanged;
-    const int series = mSeries.size();
-    copyDatabaseValuesIntoTagMap(*study);
-    return isChanged || mSeries.size() != series;
-}
-
-/// Whether a path or a volume's name changed.
-bool TagFile::syncSeries(TagMap& series, const Kxg::DicomDirectoryEntry& entry)
-{
-    bool isChanged = false;
-    for (const Kxg::ImageFile& file : entry.seriesInfo != nullptr ? entry.seriesInfo->images : kNoImages) {
-        const TagMap* image = findImage(file);
-        isChanged = isChanged || (image != nullptr && filePathOf(*image) != forwardSlashes(file.path));
-    }
-    bool complete = true;
-    addDicomFilePaths(&series, entry.seriesInfo.get(), false, complete);
-    const QVector<QByteArray> names = volumeNames(series);
-    addVolumeFilePath(&series, entry, false);
-    for (const Kxg::DicomDirectoryEntry& file : entry.entries)
-        addVolumeFilePath(&series, file, false);
-    return isChanged || names != volumeNames(series);
-}
-
-/// Removes the images and series that the database does not list. The path that an image brought along from the building
-/// of the file says nothing of what the database knows.
-bool TagFile::removeUnlisted(const DatabaseView& view)
-{
-    bool isChanged = false;
-    const NodeIndex held = mSeries;
-    for (auto it = held.cbegin(); it != held.cend(); ++it) {
-        TagMap* series = it.value();
-        const QList<TagMap*> images = series->children();
-        // Of a listed series whose images were not asked for nothing is known.
-        const bool isAsked = !view.lists(it.key()) || view.listsImagesOf(it.key());
-        for (int i = images.size() - 1; i >= 0 && isAsked; --i) {
-            if (view.knows(images.at(i)))
-                continue;
-            dropImage(images.at(i));
-            isChanged = true;
-        }
-        if (view.lists(it.key()) || !series->children().isEmpty())
-            continue;
-        TagMap* study = series->parent();
-        dropSeries(series);
-        isChanged = true;
-        if (study != nullptr)
-            dropStudyIfEmpty(study);
-    }
-    return isChanged;
+    isChanged = removeUnlisted(tree, view) || isChanged;
+    const int series = tree.series().size();
+    DatabaseValues(tree).copyStudy(*study);
+    return isChanged || tree.series().size() != series;
 }
 
 }  // namespace Kdd

@@ -1,5 +1,7 @@
+#include "kddlib/tagfile/DatabaseValues.h"
+
 #include "kddlib/tagfile/NodeAttributes.h"
-#include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagfile/StudyTree.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
@@ -9,12 +11,8 @@
 #include "platform/database/DirectoryEntry.h"
 #include "platform/volumefile/VolumeFileName.h"
 
-#include <QHash>
-#include <QSet>
-
 #include <dcmtk/dcmdata/dcdeftag.h>
 
-#include <algorithm>
 #include <utility>
 
 namespace Kdd
@@ -62,48 +60,22 @@ QByteArray keyOf(const Kxg::ImageFile& file)
     return file.sopInstanceUID.isEmpty() ? forwardSlashes(file.path) : file.sopInstanceUID;
 }
 
-bool showsPixels(const TagMap* image)
-{
-    return image->findElement(DCM_PixelData) != nullptr ||
-           image->findElement(DCM_FloatPixelData) != nullptr ||
-           image->findElement(DCM_DoubleFloatPixelData) != nullptr;
-}
-
 /// What an image says of its own file. As long as a series holds it for all its images, another one would inherit it.
 const DcmTagKey kOfTheFile[] = {kFileSuffix, kTransferSyntax, kVolumeIndex, kPreview};
 
-/// A series as the user knows it: its number and what it shows.
-QByteArray labelOf(const TagMap& series)
-{
-    const bool hasPixels = std::any_of(series.children().begin(), series.children().end(), showsPixels);
-    int number = 0;
-    QByteArray label;
-    if (series.findAndGetInt(DCM_SeriesNumber, number))
-        label = QByteArray::number(number);
-    for (const DcmTagKey& key :
-         {DCM_SeriesDescription, DCM_ProtocolName, DCM_BodyPartExamined, DCM_Modality}) {
-        QByteArray text;
-        // Of a report or a plan the kind says more than what was written into its description.
-        if ((hasPixels || key == DCM_Modality) && series.findAndGetString(key, text) &&
-            !text.trimmed().isEmpty())
-            return (label + ' ' + text.trimmed()).trimmed();
-    }
-    return label.isEmpty() ? QByteArrayLiteral("Series") : label;
-}
-
 }  // namespace
 
-TagMap* TagFile::findImage(const Kxg::ImageFile& file) const
+TagMap* DatabaseValues::findImage(const StudyTree& tree, const Kxg::ImageFile& file)
 {
-    return findImage(keyOf(file));
+    return tree.findImage(keyOf(file));
 }
 
-int TagFile::addDicomFilePaths(TagMap* series, const Kxg::SeriesInfo* info, bool createMissing,
-                               bool& complete)
+int DatabaseValues::addFilePaths(TagMap* series, const Kxg::SeriesInfo* info, bool createMissing,
+                                 bool& complete)
 {
     int count = 0;
     for (const Kxg::ImageFile& file : info != nullptr ? info->images : std::vector<Kxg::ImageFile>()) {
-        TagMap* image = findImage(file);
+        TagMap* image = findImage(mTree, file);
         if (image == nullptr && createMissing)
             image = makeImage(series, file);
         if (image == nullptr) {
@@ -117,7 +89,7 @@ int TagFile::addDicomFilePaths(TagMap* series, const Kxg::SeriesInfo* info, bool
     return count;
 }
 
-TagMap* TagFile::makeImage(TagMap* series, const Kxg::ImageFile& file)
+TagMap* DatabaseValues::makeImage(TagMap* series, const Kxg::ImageFile& file)
 {
     for (const DcmTagKey& key : kOfTheFile) {
         if (series->tagsForLevel().contains(key))
@@ -127,12 +99,14 @@ TagMap* TagFile::makeImage(TagMap* series, const Kxg::ImageFile& file)
     if (!file.sopInstanceUID.isEmpty())
         image->putAndInsertString(DCM_SOPInstanceUID, file.sopInstanceUID);
     image->markAsOmitted(DCM_PixelData);
+    // Appended and not attached: a first child would replace what the series says by what it has, which is nothing.
     series->appendChild(image);
-    mImages.insert(keyOf(file), image);
+    mTree.enterImage(keyOf(file), image);
     return image;
 }
 
-void TagFile::addVolumeFilePath(TagMap* series, const Kxg::DicomDirectoryEntry& entry, bool createMissing)
+void DatabaseValues::addVolumeFilePath(TagMap* series, const Kxg::DicomDirectoryEntry& entry,
+                                       bool createMissing)
 {
     const bool isVolume = (entry.flags & Kxg::DicomDirectoryEntry::HasVolume) != 0 &&
                           entry.type != Kxg::DicomDirectoryEntry::DicomFile && !entry.name.isEmpty();
@@ -155,52 +129,28 @@ void TagFile::addVolumeFilePath(TagMap* series, const Kxg::DicomDirectoryEntry& 
 
 /// The study's map stays, and with it every value that its images inherit: a map made from the database alone knows
 /// only a few of them.
-void TagFile::copyDatabaseValuesIntoTagMap(const Kxg::DicomDirectoryEntry& entry)
+void DatabaseValues::copyStudy(const Kxg::DicomDirectoryEntry& entry)
 {
-    if (!isEmpty() && studyInstanceUID() != entry.studyInstanceUID) {
+    if (!mTree.isEmpty() && mTree.studyInstanceUID() != entry.studyInstanceUID) {
         LogFile::errorf("What the database says of study %s is no part of study %s",
-                        entry.studyInstanceUID.constData(), studyInstanceUID().constData());
+                        entry.studyInstanceUID.constData(), mTree.studyInstanceUID().constData());
         return;
     }
-    std::shared_ptr<TagMap>& study = mStudies[entry.studyInstanceUID];
+    std::shared_ptr<TagMap> study = mTree.study();
     if (study == nullptr) {
         study = std::make_shared<TagMap>();
         study->putAndInsertString(DCM_StudyInstanceUID, entry.studyInstanceUID);
+        mTree.enterStudy(entry.studyInstanceUID, study);
     }
     study->putAndInsertInt(kFromDatabase, 1);
     for (const Kxg::DicomDirectoryEntry& series : entry.entries) {
-        if (isHidden(series.modality) || mSeries.contains(series.seriesInstanceUID))
+        if (isHidden(series.modality) || mTree.series().contains(series.seriesInstanceUID))
             continue;
         TagMap* made = makeSeries(series);
+        // The new series is not to inherit what the study says for all those that were there.
         holdInSeries(*study);
         study->appendChild(made);
-        mSeries.insert(series.seriesInstanceUID, made);
-    }
-}
-
-/// Series of the same label are told apart by their place among those, in the order of their UIDs.
-void TagFile::createAbstractTags()
-{
-    QMap<QByteArray, QByteArray> labels;
-    QHash<QByteArray, int> sharing;
-    for (auto it = mSeries.cbegin(); it != mSeries.cend(); ++it) {
-        labels.insert(it.key(), labelOf(*it.value()));
-        ++sharing[labels.value(it.key())];
-    }
-    QSet<QByteArray> taken;
-    for (auto it = sharing.cbegin(); it != sharing.cend(); ++it)
-        taken.insert(it.key());
-    QHash<QByteArray, int> counts;
-    for (auto it = mSeries.cbegin(); it != mSeries.cend(); ++it) {
-        QByteArray label = labels.value(it.key());
-        if (sharing.value(label) > 1) {
-            const QByteArray shared = label;
-            do
-                label = shared + " (" + QByteArray::number(++counts[shared]) + ')';
-            while (taken.contains(label));
-            taken.insert(label);
-        }
-        it.value()->putAndInsertValue(kAbstract, VrCode::LO, label);
+        mTree.enterSeries(series.seriesInstanceUID, made);
     }
 }
 

@@ -1,7 +1,10 @@
+#include "kddlib/tagfile/StudyPreviews.h"
+
 #include "kddlib/net/dicom/KxDcmFileLoader.h"
 #include "kddlib/previews/PreviewGenerator.h"
 #include "kddlib/previews/QuadrantNavigation.h"
-#include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagfile/StudyTree.h"
+#include "kddlib/tagfile/TagFileSettings.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
@@ -27,6 +30,7 @@ namespace Kdd
 namespace
 {
 
+// Of more images a user sees nothing in a row of small pictures, and the pictures outweigh all the rest of a tag file.
 constexpr int kLongSeries = 20;
 constexpr int kHashBytes = 4;
 
@@ -104,6 +108,7 @@ Images middleOf(Images images)
 {
     if (images.isEmpty())
         return {};
+    // Read once: the search asks for each many times.
     QHash<const TagMap*, int> numbers;
     for (const TagMap* image : qAsConst(images))
         numbers.insert(image, numberOf(*image, DCM_InstanceNumber));
@@ -176,28 +181,28 @@ QImage PreviewGenerator::createPreviewImage(OrlanMesh* mesh, const TypedData2D& 
 {
     if (frame.isEmpty())
         return {};
-    const Vec2i size = TagFile::previewSize();
+    const Vec2i size = TagFileSettings::previewSize();
     return convertToQImage(KxVolumeInfo::fromFrame(mesh, frame).get(), size.x, size.y);
 }
 
-void TagFile::selectPreviewImages2D(QList<QByteArray>& uids) const
+QList<QByteArray> selectPreviewImages(const StudyTree& tree)
 {
-    uids.clear();
-    for (const TagMap* series : mSeries) {
+    QList<QByteArray> keys;
+    for (const TagMap* series : tree.series()) {
         for (const TagMap* image : selectedOf(kindsIn(*series)))
-            uids.append(imageKey(*image));
+            keys.append(StudyTree::imageKey(*image));
     }
+    return keys;
 }
 
-// NOLINTNEXTLINE(readability-convert-member-functions-to-static): of one form with those that find the image
-bool TagFile::addPreview(TagMap* image, DcmDataset* dataset, const QString& path)
+bool addPreview(TagMap* image, DcmDataset* dataset, const QString& path)
 {
     if (image == nullptr)
         return false;
+    const Vec2i size = TagFileSettings::previewSize();
     QString reason;
-    const QImage preview =
-        PreviewGenerator::createPreviewImage(dataset, static_cast<unsigned long>(sPreviewSize.x),
-                                             static_cast<unsigned long>(sPreviewSize.y), path, &reason);
+    const QImage preview = PreviewGenerator::createPreviewImage(
+        dataset, static_cast<unsigned long>(size.x), static_cast<unsigned long>(size.y), path, &reason);
     if (preview.isNull()) {
         LogFile::warnf(kNotCreated, qUtf8Printable(path), qUtf8Printable(reason));
         return false;
@@ -210,7 +215,7 @@ bool TagFile::addPreview(TagMap* image, DcmDataset* dataset, const QString& path
     return true;
 }
 
-bool TagFile::addPreview(TagMap* image, const QByteArray& file)
+bool addPreview(TagMap* image, const QByteArray& file)
 {
     if (image == nullptr)
         return false;
@@ -223,12 +228,7 @@ bool TagFile::addPreview(TagMap* image, const QByteArray& file)
     return addPreview(image, format.getDataset(), pathText(file));
 }
 
-bool TagFile::addPreview(const QByteArray& sopInstanceUID, const QString& path)
-{
-    return addPreview(findImage(sopInstanceUID), pathBytes(path));
-}
-
-bool TagFile::addPreview(DcmDataset* dataset, const QString& path)
+bool addPreview(const StudyTree& tree, DcmDataset* dataset, const QString& path)
 {
     DcmElement* element = nullptr;
     if (dataset == nullptr || dataset->findAndGetElement(DCM_SOPInstanceUID, element).bad())
@@ -236,16 +236,16 @@ bool TagFile::addPreview(DcmDataset* dataset, const QString& path)
     // By way of a map, which also knows UIDs that a writer stored without their VR.
     TagMap uid;
     uid.setElement(element);
-    return addPreview(findImage(uid.uid(TagMap::ImageLevel)), dataset, path);
+    return addPreview(tree.findImage(uid.uid(TagMap::ImageLevel)), dataset, path);
 }
 
-int TagFile::exportPreviews(const QString& folder) const
+int exportPreviews(const StudyTree& tree, const QString& folder)
 {
     QString prefix = folder.isEmpty() ? QDir::currentPath() : folder;
     if (!prefix.endsWith(QLatin1Char('/')))
         prefix += QLatin1Char('/');
     int count = 0;
-    for (auto study = mStudies.cbegin(); study != mStudies.cend(); ++study) {
+    for (auto study = tree.studies().cbegin(); study != tree.studies().cend(); ++study) {
         NameNumbers numbers;
         for (TagMap* series : study.value()->children()) {
             const QString number = numbers.take(numberOf(*series, DCM_SeriesNumber));

@@ -1,3 +1,4 @@
+#include "kddlib/tagfile/StudyTree.h"
 #include "kddlib/tagfile/qa/QAVolumes.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
@@ -21,6 +22,7 @@ QVector<Slice> slicesOf(const VolumeInfo& info)
             slices.append({i, 0});
         return slices;
     }
+    // UIDs have dots themselves: the last one comes before the frame number.
     QHash<QByteArray, int> places;
     for (int i = 0; i < count; ++i)
         places.insert(QByteArray::fromStdString(info.imageUIDs.at(static_cast<std::size_t>(i))), i);
@@ -41,30 +43,31 @@ bool hasVolumeOf(const TagMap* series, const QByteArray& suffix)
 
 }  // namespace
 
-void TagFile::addDividedVolume(const VolumeInfo& info)
+void QAVolumes::addDivided(StudyTree& tree, const VolumeInfo& info)
 {
     QASeriesMove::Stack stack;
     for (const std::string& uid : info.imageUIDs)
         stack.images.append(QByteArray::fromStdString(uid));
     stack.volume.setSlices(slicesOf(info));
+    // No columns: of a part nothing is known but the number of slices.
     stack.volume.setGeometry({0, 0, info.dims.z}, Box3f(), Mat4f());
     stack.volume.setPreviewData(info.preview);
     QASeriesMove move;
-    move.source = this;
+    move.source = &tree;
     move.stacks.push_back(stack);
-    updateVolumesAfterQA(move);
+    giveBack(tree, move);
 }
 
-void TagFile::keepVolumesOf(TagFile& former, const QSet<QByteArray>& suffixes)
+void QAVolumes::keep(StudyTree& tree, StudyTree& former, const QSet<QByteArray>& suffixes)
 {
-    const auto isInVolume = [this](const QByteArray& key) {
-        const TagMap* image = findImage(key);
+    const auto isInVolume = [&tree](const QByteArray& key) {
+        const TagMap* image = tree.findImage(key);
         return image != nullptr && image->findElement(kVolumeIndex) != nullptr;
     };
-    for (TagMap* series : qAsConst(former.mSeries)) {
-        QASeriesMove move = QAVolumes::takeOut(former, *series);
-        move.source = this;
-        const TagMap* present = findSeries(move.seriesUID);
+    for (TagMap* series : former.series()) {
+        QASeriesMove move = takeOut(former, *series);
+        move.source = &tree;
+        const TagMap* present = tree.findSeries(move.seriesUID);
         const auto isToStay = [&](const QASeriesMove::Stack& stack) {
             const QByteArray suffix = stack.volume.fileNameSuffix();
             // A part of a divided volume does not say of which.
@@ -75,7 +78,7 @@ void TagFile::keepVolumesOf(TagFile& former, const QSet<QByteArray>& suffixes)
         move.stacks.erase(std::remove_if(move.stacks.begin(), move.stacks.end(), std::not_fn(isToStay)),
                           move.stacks.end());
         if (!move.stacks.empty())
-            updateVolumesAfterQA(move);
+            giveBack(tree, move);
     }
 }
 
