@@ -35,6 +35,7 @@ int openDescriptor(const QByteArray& path, FileLock lock, IfAbsent ifAbsent)
 int takeLock(int fd, FileLock lock)
 {
     const int operation = lock == FileLock::Shared ? LOCK_SH : LOCK_EX;
+    // Never waiting in the system: a wait there has no end when its holder hangs, and this one is counted.
     while (::flock(fd, operation | LOCK_NB) != 0) {
         if (errno != EINTR)
             return errno;

@@ -224,6 +224,7 @@ JournalContent readJournal(int fd)
     QByteArray content(static_cast<int>(length), Qt::Uninitialized);
     if (const int error = readAll(fd, content, kHeaderSize))
         return {false, {}, error};
+    // The length alone does not tell: room that was never written reads as zeros after a loss of power.
     if (checksum(content) != qFromLittleEndian<quint32>(header.constData() + kChecksumAt))
         return {};
     return {true, content, 0};

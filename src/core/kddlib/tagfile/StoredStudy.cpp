@@ -130,6 +130,7 @@ Result StoredStudy::hold(const QByteArray& studyUID, IfAbsent ifAbsent)
         ifAbsent == IfAbsent::Create ? StudyFile::Access::HoldOrMake : StudyFile::Access::Hold;
     const LockedOpenResult opened = mFile.open(path, access);
     mIsLockedOut = false;
+    // A study without file has no images to be corrected: its holder finds none and changes nothing.
     if (opened.failure == OpenFailure::NotFound && ifAbsent == IfAbsent::Fail)
         return {};
     if (!opened)
@@ -217,6 +218,7 @@ Result StoredStudy::writeInto(StudyFile& file, Tail tail)
         file.removeIfNeverWritten();
         return result;
     }
+    // Of the bytes themselves, by which the database later tells whether others wrote since.
     mStamp = {content.size(), QCryptographicHash::hash(content, QCryptographicHash::Md5)};
     if (LogFile::debugLogging())
         LogFile::printf("Written tag file %s in %d msec", qUtf8Printable(file.path()), mFigures.writeMs);

@@ -186,6 +186,7 @@ void StudyTree::dropStudyIfEmpty(TagMap* study)
     if (!study->children().isEmpty())
         return;
     const auto holds = [study](const std::shared_ptr<TagMap>& each) { return each.get() == study; };
+    // By the node: what the study says of its UID may have been corrected since it was entered.
     const auto at = std::find_if(mStudies.begin(), mStudies.end(), holds);
     if (at != mStudies.end())
         mStudies.erase(at);

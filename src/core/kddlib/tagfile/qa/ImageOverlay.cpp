@@ -118,6 +118,7 @@ QByteArray ImageOverlay::seriesOf(const TagMap& image) const
 QByteArray ImageOverlay::encode() const
 {
     KxMsg out;
+    // A preview would go to a table that the overlay does not have; none is ever noted.
     QList<QByteArray> previews;
     out << kForm;
     mElements->serialize(out, previews);

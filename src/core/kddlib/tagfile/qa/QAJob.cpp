@@ -144,6 +144,7 @@ Result QAJob::hold()
         result = hold(mDestination, mJob.studyUID, IfAbsent::Create);
     if (result.bad())
         return result;
+    // To be put back when the source cannot be written, for then the images must not stand here as well.
     mBefore = mDestination.file().content();
     return isSourceFirst ? result : hold(mSource, mJob.oldStudyUID, IfAbsent::Fail);
 }
@@ -207,6 +208,7 @@ Result QAJob::write()
         result = writeSource();
     if (result.bad())
         return result;
+    // Only now: until the files are written, a build must make the corrections from what was recorded.
     mRecord.finish(mDestination.tree(), mDestination.stamp(), mJob.studyUID);
     if (mIsMove)
         mRecord.finish(mSource.tree(), mSource.stamp(), mJob.oldStudyUID);

@@ -198,6 +198,7 @@ Result QAJob::place(const Edit& edit, StudyTree& target, const QByteArray& newKe
         volumes->movedTo.insert(edit.key, newKey);
     mLeft.insert({&origin(), seriesUID});
     std::unique_ptr<TagMap> image(origin().takeImage(edit.key));
+    // It named volumes of its old series; its places are given back by image when all have moved.
     image->deleteElement(kVolumeIndex);
     const TagMap* placed = target.add(image.release(), nullptr, true);
     if (placed == nullptr)

@@ -79,6 +79,7 @@ Result QARecord::claim(const QAData& job)
     }
     if (result.bad())
         return result.within(QString::fromLatin1(kNotKept));
+    // Images that no database lists are not built again either, so there is nobody to be told.
     if (known.isEmpty())
         return {};
     mCatalogue = std::move(catalogue);

@@ -13,6 +13,7 @@ namespace Kdd
 namespace
 {
 
+// The lengths that DICOM allows [characters].
 constexpr int kLongestIntegerString = 12;
 constexpr int kLongestDecimalString = 16;
 constexpr int kLongestFraction = 6;
@@ -123,6 +124,7 @@ QByteArray firstOddValue(VrCode vr, const QByteArray& text)
     const Rule* rule = ruleOf(vr);
     if (rule == nullptr)
         return {};
+    // Empty values stay: they are how an image says that it does not know.
     for (const QByteArray& value : text.split('\\')) {
         const QByteArray bare = rule->isPadded ? value.trimmed() : value;
         if (!bare.isEmpty() && !rule->holds(bare))

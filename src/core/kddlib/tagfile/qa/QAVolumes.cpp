@@ -92,6 +92,7 @@ QVector<TagMap*> QAVolumes::imagesNow(const QASeriesMove::Stack& stack) const
 void QAVolumes::giveBack(const QASeriesMove::Stack& stack)
 {
     const QVector<TagMap*> images = imagesNow(stack);
+    // In the order of the volume's images, so that the same job always numbers the parts alike.
     QVector<TagMap*> holders;
     for (const TagMap* image : images) {
         if (image != nullptr && !holders.contains(image->parent()))
@@ -117,6 +118,7 @@ void QAVolumes::attach(TagMap* series, const Volume& volume, const QVector<TagMa
 {
     auto part = isWhole ? std::make_unique<Volume>(volume) : std::make_unique<Volume>();
     part->attachImages(series->volumes().size(), withoutGaps(images));
+    // Attaching sorts the images, so each slice looks for its own.
     QHash<const TagMap*, int> places;
     for (int i = 0; i < part->numImages(); ++i)
         places.insert(part->image(i), i);
