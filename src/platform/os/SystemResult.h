@@ -8,7 +8,7 @@ namespace Kdd
 {
 
 /// A result of the operating system's: a failure also has its errno, for messages that tell the number.
-class SystemResult : public Result
+class SystemResult
 {
 public:
     /// Done.
@@ -28,16 +28,24 @@ public:
         return QString::fromLocal8Bit(std::system_category().message(error).c_str());
     }
 
+    /// What callers pass on who need no number.
+    operator const Result&() const { return mResult; }
+
+    bool good() const { return mResult.good(); }
+    bool bad() const { return mResult.bad(); }
+    const QString& text() const { return mResult.text(); }
+
     /// 0 when good.
     int error() const { return mError; }
 
 private:
     SystemResult(const Result& result, int error)
-        : Result(result)
+        : mResult(result)
         , mError(error)
     {
     }
 
+    Result mResult;
     int mError = 0;
 };
 

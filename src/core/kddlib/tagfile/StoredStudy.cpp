@@ -92,7 +92,7 @@ Result StoredStudy::openToRead(const QString& path, Reader reader)
     const LockedOpenResult opened =
         mFile.open(path, isServing ? StudyFile::Access::ReadWaiting : StudyFile::Access::Read);
     if (!opened) {
-        const Result result = failToOpen(opened);
+        Result result = failToOpen(opened);
         const bool isTold =
             mIsLockedOut ? !isServing : opened.failure != OpenFailure::NotFound || LogFile::debugLogging();
         if (isTold)
@@ -165,7 +165,7 @@ Result StoredStudy::write()
         return mFile.isOpen() ? mFile.remove() : Result::failure(QStringLiteral("No images to write"));
     if (!mFile.isOpen())
         return write(TagFileSettings::cacheFilePathForStudy(mTree.studyInstanceUID().constData()));
-    const Result result = writeInto(mFile, Tail::Keep);
+    Result result = writeInto(mFile, Tail::Keep);
     mFile.close();
     return result;
 }

@@ -124,7 +124,7 @@ Result QAJob::prepare()
 /// Whoever builds a study claims it first and holds its file then.
 Result QAJob::claim()
 {
-    const Result result = mRecord.claim(mJob);
+    Result result = mRecord.claim(mJob);
     mJob.outcome.isLockedOut = mRecord.wasLockedOut();
     return result;
 }
@@ -151,7 +151,7 @@ Result QAJob::hold()
 
 Result QAJob::hold(StoredStudy& study, const QByteArray& studyUID, IfAbsent ifAbsent)
 {
-    const Result held = study.hold(studyUID, ifAbsent);
+    Result held = study.hold(studyUID, ifAbsent);
     if (held.good())
         return held;
     mJob.outcome.isLockedOut = study.wasLockedOut();
@@ -183,7 +183,7 @@ void QAJob::tidy()
 
 Result QAJob::record()
 {
-    const Result result = mRecord.record();
+    Result result = mRecord.record();
     mJob.outcome.isLockedOut = mRecord.wasLockedOut();
     return result;
 }
@@ -218,7 +218,7 @@ Result QAJob::write()
 Result QAJob::writeSource()
 {
     const bool isEmpty = mSource.tree().isEmpty();
-    const Result written = isEmpty ? mSource.write() : mSource.writeHeld();
+    Result written = isEmpty ? mSource.write() : mSource.writeHeld();
     if (written.good())
         return written;
     // Of a file that the system would not remove nobody knows whether it is gone.
