@@ -50,7 +50,7 @@ QByteArray recovered(const QString& path)
     QFile file;
     require(bool(openLockedFile(file, path, FileLock::Exclusive, IfAbsent::Fail, {1, 0})),
             "the file can be locked");
-    require(recoverInterruptedWrite(file, path, Flush::Process).isEmpty(), "the file can be recovered");
+    require(recoverInterruptedWrite(file, path, Flush::Process).good(), "the file can be recovered");
     return file.readAll();
 }
 

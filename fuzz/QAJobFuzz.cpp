@@ -2,8 +2,8 @@
 // the log that it leaves in an image can be read back. A text that is no log is never taken for one of other bytes.
 
 #include "fuzz/Property.h"
-#include "kddlib/tagfile/QAAudit.h"
-#include "kddlib/tagfile/QAEditor.h"
+#include "kddlib/tagfile/qa/QAAudit.h"
+#include "kddlib/tagfile/qa/QAEditor.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
 
@@ -33,12 +33,12 @@ void checkEdit(const QAData& job)
     TagMap image;
     QAEditor editor(image, job.substitutions);
     for (const QASubstitution& each : job.substitutions) {
-        if (!editor.substitute(each).isEmpty())
+        if (editor.substitute(each).bad())
             return;
     }
     QAEditor again(image, job.substitutions);
     for (const QASubstitution& each : job.substitutions)
-        require(each.key == DCM_PixelData || again.substitute(each).isEmpty(), "what was done can be done");
+        require(each.key == DCM_PixelData || again.substitute(each).good(), "what was done can be done");
     require(again.changes().isEmpty(), "what was done changes nothing");
 
     AuditLog log;
@@ -81,7 +81,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, std::size_t size)
         return 0;
     }
     checkJob(job);
-    if (refusalOf(job).isEmpty())
+    if (check(job).good())
         checkEdit(job);
     return 0;
 }

@@ -40,12 +40,13 @@ set(KDD_PUBLIC_HEADERS
   core/kddlib/net/http/ObjectVersion.h
   core/kddlib/previews/PreviewGenerator.h
   core/kddlib/previews/QuadrantNavigation.h
-  core/kddlib/tagfile/ImageOverlay.h
-  core/kddlib/tagfile/QAAudit.h
-  core/kddlib/tagfile/QAData.h
-  core/kddlib/tagfile/QASeriesMove.h
   core/kddlib/tagfile/StudyRecord.h
   core/kddlib/tagfile/TagFile.h
+  core/kddlib/tagfile/TagFileSettings.h
+  core/kddlib/tagfile/qa/ImageOverlay.h
+  core/kddlib/tagfile/qa/QAAudit.h
+  core/kddlib/tagfile/qa/QAData.h
+  core/kddlib/tagfile/qa/QASeriesMove.h
   core/kddlib/tagmodel/OwnAttributes.h
   core/kddlib/tagmodel/TagElement.h
   core/kddlib/tagmodel/TagMap.h
@@ -65,6 +66,7 @@ set(KDD_PUBLIC_HEADERS
   platform/base/CreateUIDs.h
   platform/base/Export.h
   platform/base/Geometry.h
+  platform/base/IfAbsent.h
   platform/base/KxMsg.h
   platform/base/LogFile.h
   platform/base/Result.h
@@ -80,6 +82,7 @@ set(KDD_PUBLIC_HEADERS
   platform/os/ExclusiveFile.h
   platform/os/FileStatus.h
   platform/os/PathName.h
+  platform/os/SystemResult.h
   platform/resources/ExResource.h
   platform/volume/KxCompressedDataMedia.h
   platform/volume/KxHistogram.h

@@ -1,6 +1,6 @@
 #include "Pages.h"
 #include "SampleArchive.h"
-#include "kddlib/tagfile/QAData.h"
+#include "kddlib/tagfile/qa/QAData.h"
 
 #include <QSettings>
 

@@ -1,7 +1,8 @@
 #include "platform/os/ExclusiveFile.h"
 
+#include "support/FileContent.h"
+
 #include <QFile>
-#include <QTemporaryDir>
 
 #include <gtest/gtest.h>
 #include <sys/mman.h>
@@ -59,18 +60,14 @@ private:
     pid_t mPid;
 };
 
-class ExclusiveFileTest : public testing::Test
+class ExclusiveFileTest : public FileTest
 {
 protected:
-    QString path() const { return mFolder.filePath(QStringLiteral("file")); }
     OpenFailure open(QFile& file, FileLock lock) const
     {
         const IfAbsent ifAbsent = lock == FileLock::Exclusive ? IfAbsent::Create : IfAbsent::Fail;
         return openLockedFile(file, path(), lock, ifAbsent, kOnce).failure;
     }
-
-private:
-    QTemporaryDir mFolder;
 };
 
 TEST_F(ExclusiveFileTest, OnlyReadersGoTogetherAndDeathFreesTheFile)
@@ -103,7 +100,7 @@ bool countOnce(const QString& path, std::atomic<int>& taken, bool deletes)
     if (!deletes)
         return file.seek(0) && file.write(QByteArray::number(count)) > 0 && file.flush();
     taken += count;
-    return removeLocked(file, path);
+    return removeLocked(file, path).good();
 }
 
 TEST_F(ExclusiveFileTest, NoCountIsLostWhileOthersDelete)

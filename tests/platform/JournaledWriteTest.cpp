@@ -1,13 +1,11 @@
 #include "platform/os/JournaledWrite.h"
 
 #include "platform/os/ExclusiveFile.h"
+#include "support/FileContent.h"
 
 #include <QFile>
-#include <QTemporaryDir>
-#include <QtEndian>
 
 #include <gtest/gtest.h>
-#include <libdeflate.h>
 #include <linux/filter.h>
 #include <linux/seccomp.h>
 #include <sys/prctl.h>
@@ -27,15 +25,6 @@ namespace
 const QByteArray kOld = QByteArray("the old content, longer than the new").repeated(3);
 const QByteArray kNew("what replaces it");
 const QByteArray kLonger = kOld + kNew;
-
-QByteArray journalOf(const QByteArray& content)
-{
-    QByteArray bytes("KDDJRNL1............");
-    const auto size = static_cast<size_t>(content.size());
-    qToLittleEndian(quint64{size}, bytes.data() + 8);
-    qToLittleEndian(libdeflate_crc32(0, content.constData(), size), bytes.data() + 16);
-    return bytes + content;
-}
 
 const QByteArray kJournal = journalOf(kNew);
 
@@ -68,38 +57,26 @@ void breakStep(const Step& step, unsigned verdict, int target)
         ::_exit(100);
 }
 
-class JournaledWriteTest : public testing::Test
+class JournaledWriteTest : public FileTest
 {
 protected:
-    JournaledWriteTest() { put(path(), kOld); }
+    JournaledWriteTest() { putFile(path(), kOld); }
 
-    QString path() const { return mFolder.filePath(QStringLiteral("file")); }
-    static void put(const QString& where, const QByteArray& bytes)
-    {
-        QFile file(where);
-        ASSERT_TRUE(file.open(QIODevice::WriteOnly));
-        ASSERT_EQ(file.write(bytes), bytes.size());
-    }
-    QByteArray content() const
-    {
-        QFile file(path());
-        return file.open(QIODevice::ReadOnly) ? file.readAll() : QByteArray("(no file)");
-    }
     void lock(QFile& file) const
     {
         ASSERT_TRUE(openLockedFile(file, path(), FileLock::Exclusive, IfAbsent::Create, {1, 0}));
     }
-    QString write(const QByteArray& bytes, WriteOptions options = {}) const
+    bool write(const QByteArray& bytes, WriteOptions options = {}) const
     {
         QFile file;
         lock(file);
-        return writeInPlace(file, path(), bytes, options);
+        return writeInPlace(file, path(), bytes, options).good();
     }
     void expectRecovered(const QByteArray& expected) const
     {
         QFile file;
         lock(file);
-        EXPECT_EQ(recoverInterruptedWrite(file, path(), Flush::Process), QString());
+        EXPECT_TRUE(recoverInterruptedWrite(file, path(), Flush::Process).good());
         EXPECT_EQ(content(), expected);
         EXPECT_FALSE(hasJournal(path()));
     }
@@ -112,29 +89,26 @@ protected:
             QFile file;
             lock(file);
             breakStep(step, verdict, file.handle());
-            ::_exit(writeInPlace(file, path(), bytes, {Flush::Disk, Tail::Cut}).isEmpty() ? 0 : 1);
+            ::_exit(writeInPlace(file, path(), bytes, {Flush::Disk, Tail::Cut}).good() ? 0 : 1);
         }
         int status = -1;
         ::waitpid(pid, &status, 0);
         return WIFEXITED(status) ? WEXITSTATUS(status) : WTERMSIG(status);
     }
-
-private:
-    QTemporaryDir mFolder;
 };
 
 TEST_F(JournaledWriteTest, RecoveryOrTheNextWriterCompletesATornFile)
 {
     for (int torn = 0; torn <= kNew.size(); ++torn) {
-        put(path(), kNew.left(torn) + kOld.mid(torn));
-        put(journalPath(path()), kJournal);
+        putFile(path(), kNew.left(torn) + kOld.mid(torn));
+        putFile(journalPath(path()), kJournal);
         expectRecovered(kNew + kOld.mid(kNew.size()));
     }
-    put(path(), kOld);
-    put(journalPath(path()), kJournal);
-    EXPECT_EQ(write("T"), QString());
+    putFile(path(), kOld);
+    putFile(journalPath(path()), kJournal);
+    EXPECT_TRUE(write("T"));
     EXPECT_EQ(content(), 'T' + kNew.mid(1) + kOld.mid(kNew.size()));
-    EXPECT_EQ(write(kNew, {Flush::Process, Tail::Cut}), QString());
+    EXPECT_TRUE(write(kNew, {Flush::Process, Tail::Cut}));
     EXPECT_EQ(content(), kNew);
     EXPECT_FALSE(hasJournal(path()));
 }
@@ -148,7 +122,7 @@ TEST_F(JournaledWriteTest, ADamagedJournalIsDroppedAndTheFileLeftAlone)
     }
     for (const QByteArray& journal : qAsConst(damaged)) {
         SCOPED_TRACE(journal.toHex().constData());
-        put(journalPath(path()), journal);
+        putFile(journalPath(path()), journal);
         expectRecovered(kOld);
     }
 }
@@ -168,7 +142,7 @@ TEST_F(JournaledWriteTest, AStepThatFailsOrKillsIsReportedAndLeavesTheOldContent
     for (const Step& step : kSteps) {
         for (const bool dies : {false, true}) {
             SCOPED_TRACE(step.name);
-            put(path(), kOld);
+            putFile(path(), kOld);
             const unsigned verdict = dies ? SECCOMP_RET_KILL_PROCESS : SECCOMP_RET_ERRNO | step.error;
             EXPECT_EQ(writeBroken(kLonger, step, verdict), dies ? SIGSYS : 1);
             // What was undone needs no recovery, and everything else is marked as unfinished.

@@ -1,6 +1,6 @@
 #include "CommandLineFixture.h"
-#include "kddlib/tagfile/QAAudit.h"
 #include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagfile/qa/QAAudit.h"
 #include "kddlib/tagmodel/TagMap.h"
 
 #include <QElapsedTimer>

@@ -64,7 +64,7 @@ qint64 readFirst(const char* path, QByteArray& bytes, std::string& reason)
     if (KxCurlClient::isUrl(path))
         return readFirstOfObject(path, bytes, reason);
     RandomAccessFile file;
-    return file.open(path) == 0 ? qMax<qint64>(0, file.readAt(0, bytes.data(), bytes.size())) : -1;
+    return file.open(path).good() ? qMax<qint64>(0, file.readAt(0, bytes.data(), bytes.size())) : -1;
 }
 
 /// The first bytes of a file; false, with the reason logged, when there are not so many.

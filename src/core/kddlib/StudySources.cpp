@@ -131,7 +131,7 @@ bool StudySources::collect(const QByteArray& user, int studyId)
     QSet<QByteArray> listed;
     for (const std::string& path : dicomFiles)
         listed.insert(QByteArray::fromStdString(path));
-    adopted = std::make_unique<AdoptedCorrections>(former, corrections, listed);
+    adopted = std::make_unique<AdoptedCorrections>(former.imagesByUID(), corrections, listed);
     const Result result = adopted->record();
     if (result.bad()) {
         LogFile::errorf("The corrections of study %s cannot be kept: %s", corrections.studyUID().constData(),

@@ -1,8 +1,8 @@
 #pragma once
 
-#include "kddlib/tagfile/AdoptedCorrections.h"
-#include "kddlib/tagfile/BuildCorrections.h"
 #include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagfile/qa/AdoptedCorrections.h"
+#include "kddlib/tagfile/qa/BuildCorrections.h"
 #include "platform/base/Result.h"
 
 #include <QHash>

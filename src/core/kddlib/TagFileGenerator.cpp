@@ -163,7 +163,7 @@ Result TagFileGenerator::removeTagFile(const QByteArray& studyInstanceUID)
 {
     const QString path = TagFile::cacheFilePathForStudy(studyInstanceUID.constData());
     for (int i = 0; i < kRemovalAttempts; ++i) {
-        if (removeTagFileOnce(path) == 0)
+        if (removeTagFileOnce(path).good())
             return {};
         QThread::msleep(kRemovalPause);
     }

@@ -1,6 +1,7 @@
 #pragma once
 
 #include "platform/base/Export.h"
+#include "platform/base/IfAbsent.h"
 #include "platform/base/Result.h"
 #include "platform/database/TagFileStamp.h"
 
@@ -310,7 +311,7 @@ public:
 
     /// Claims one study, whether it waits or not, and waits up to `patienceMs` [ms] while another holds it. Null in
     /// `claim` when it is still held then; a study that does not exist is a failure, or is made without files.
-    enum class IfAbsent { Fail, Create };
+    using IfAbsent = Kdd::IfAbsent;
     virtual Kdd::Result claim(const QByteArray& studyUID, int patienceMs, std::unique_ptr<StudyClaim>& claim,
                               IfAbsent ifAbsent = IfAbsent::Fail) = 0;
 

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "platform/base/IfAbsent.h"
 #include "platform/base/Result.h"
 #include "platform/database/DatabaseAddress.h"
 
@@ -70,7 +71,7 @@ private:
 class SqlConnection
 {
 public:
-    enum class IfAbsent { Fail, Create };  ///< the file of an SQLite database, with its folder
+    using IfAbsent = Kdd::IfAbsent;  ///< of the file of an SQLite database, with its folder
 
     SqlConnection(DatabaseAddress address, IfAbsent ifAbsent);
     ~SqlConnection();

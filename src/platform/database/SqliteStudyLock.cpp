@@ -1,6 +1,6 @@
-#include "platform/base/SystemFailure.h"
 #include "platform/database/SqlConnection.h"
 #include "platform/database/StudyLock.h"
+#include "platform/os/SystemResult.h"
 
 #include <fcntl.h>
 #include <unistd.h>
@@ -58,7 +58,7 @@ private:
     [[noreturn]] void fail(const char* action, int error) const
     {
         throw DatabaseError(QStringLiteral("cannot %1 %2: %3")
-                                .arg(QString::fromLatin1(action), mPath, Kdd::systemFailure(error).text()));
+                                .arg(QString::fromLatin1(action), mPath, Kdd::SystemResult::textOf(error)));
     }
 
     const QString mPath;

@@ -35,6 +35,7 @@ int openDescriptor(const QByteArray& path, FileLock lock, IfAbsent ifAbsent)
 int takeLock(int fd, FileLock lock)
 {
     const int operation = lock == FileLock::Shared ? LOCK_SH : LOCK_EX;
+    // Never waiting in the system: a wait there has no end when its holder hangs, and this one is counted.
     while (::flock(fd, operation | LOCK_NB) != 0) {
         if (errno != EINTR)
             return errno;
@@ -61,32 +62,33 @@ int checkIdentity(int fd, const QByteArray& path)
 LockedOpenResult failure(int error)
 {
     if (error == EWOULDBLOCK || error == ESTALE)
-        return {-1, OpenFailure::Locked, error};
-    return {-1, error == ENOENT ? OpenFailure::NotFound : OpenFailure::System, error};
+        return {OpenFailure::Locked, error};
+    return {error == ENOENT ? OpenFailure::NotFound : OpenFailure::System, error};
 }
 
-LockedOpenResult tryOnce(const QByteArray& path, FileLock lock, IfAbsent ifAbsent)
+/// `fd` is the caller's when the attempt succeeds.
+LockedOpenResult tryOnce(const QByteArray& path, FileLock lock, IfAbsent ifAbsent, int& fd)
 {
-    const int fd = openDescriptor(path, lock, ifAbsent);
+    fd = openDescriptor(path, lock, ifAbsent);
     if (fd < 0)
         return failure(errno);
     int error = takeLock(fd, lock);
+    // Between opening and locking the holder before us may have deleted the file.
     if (error == 0)
         error = checkIdentity(fd, path);
     if (error == 0)
-        return {fd, OpenFailure::None, 0};
+        return {};
     ::close(fd);
     return failure(error);
 }
 
-}  // namespace
-
-LockedOpenResult openLocked(const QString& path, FileLock lock, IfAbsent ifAbsent, LockPolling polling)
+LockedOpenResult openLocked(const QString& path, FileLock lock, IfAbsent ifAbsent, LockPolling polling,
+                            int& fd)
 {
     const QByteArray name = pathBytes(path);
     const int attempts = std::max(polling.attempts, 1);
     for (int attempt = 1;; ++attempt) {
-        const LockedOpenResult result = tryOnce(name, lock, ifAbsent);
+        const LockedOpenResult result = tryOnce(name, lock, ifAbsent, fd);
         if (result.failure != OpenFailure::Locked || attempt == attempts)
             return result;
         // A deleted or replaced file is no reason to wait: its successor may be free at this moment.
@@ -95,27 +97,29 @@ LockedOpenResult openLocked(const QString& path, FileLock lock, IfAbsent ifAbsen
     }
 }
 
+}  // namespace
+
 LockedOpenResult openLockedFile(QFile& file, const QString& path, FileLock lock, IfAbsent ifAbsent,
                                 LockPolling polling)
 {
-    const LockedOpenResult result = openLocked(path, lock, ifAbsent, polling);
+    int fd = -1;
+    const LockedOpenResult result = openLocked(path, lock, ifAbsent, polling, fd);
     if (!result)
         return result;
     const auto mode = lock == FileLock::Shared ? QIODevice::ReadOnly : QIODevice::ReadWrite;
-    if (file.open(result.fd, mode, QFileDevice::AutoCloseHandle))
+    if (file.open(fd, mode, QFileDevice::AutoCloseHandle))
         return result;
-    ::close(result.fd);
+    ::close(fd);
     return failure(EBUSY);
 }
 
-bool removeLocked(QFile& lockedFile, const QString& path)
+SystemResult removeLocked(QFile& lockedFile, const QString& path)
 {
     // Under the lock up to here: unlinking after the close could hit the file of whoever comes next.
-    const bool removed = ::unlink(pathBytes(path).constData()) == 0 || errno == ENOENT;
-    const int error = errno;
+    const bool isRemoved = ::unlink(pathBytes(path).constData()) == 0 || errno == ENOENT;
+    const int error = isRemoved ? 0 : errno;
     lockedFile.close();
-    errno = error;
-    return removed;
+    return SystemResult::of(error);
 }
 
 }  // namespace Kdd

@@ -1,6 +1,8 @@
 #pragma once
 
 #include "platform/base/Export.h"
+#include "platform/base/IfAbsent.h"
+#include "platform/os/SystemResult.h"
 
 #include <QString>
 
@@ -16,9 +18,6 @@ namespace Kdd
 /// process. A child that is forked shares them; a program that is started does not.
 enum class FileLock { Shared, Exclusive };
 
-/// What to do when there is no file: fail, or create an empty one (mode 0666 less the umask).
-enum class IfAbsent { Fail, Create };
-
 /// How long to try while others hold the file: `attempts` times (fewer than 1 counts as 1) with pauses of `delayMs`
 /// [ms] between them, so that one attempt never pauses.
 struct LockPolling
@@ -32,32 +31,37 @@ struct LockPolling
 /// Only Locked is tried again; the other two are reported at once.
 enum class OpenFailure { None, NotFound, Locked, System };
 
-/// True when the file is open. Otherwise `fd` is -1 and `systemError` the errno that belongs to `failure`.
+/// True when the file is open. Otherwise the errno that belongs to `failure`, 0 when it is open.
 struct LockedOpenResult
 {
-    int fd = -1;
     OpenFailure failure = OpenFailure::None;
     int systemError = 0;
 
-    explicit operator bool() const { return fd >= 0; }
+    explicit operator bool() const { return failure == OpenFailure::None; }
+
+    /// The same with the reason in words.
+    SystemResult result() const
+    {
+        return failure == OpenFailure::Locked
+                   ? SystemResult::failure(systemError, QStringLiteral("others hold it"))
+                   : SystemResult::of(systemError);
+    }
 };
 
-/// Opens `path` under the lock, at offset 0 and without ever truncating it: whoever wants it empty truncates it
-/// under the lock. The caller owns the descriptor. It is the file that bore the name at some moment under the lock,
-/// never one that was deleted or replaced before the lock was gained.
-KDD_EXPORT LockedOpenResult openLocked(const QString& path, FileLock lock, IfAbsent ifAbsent,
-                                       LockPolling polling);
-
-/// The same into `file`, which has to be closed: Shared opens it read-only, Exclusive for reading and writing. The
-/// descriptor in the result belongs to `file` then, and closing `file` ends the lock. As always with a QFile that is
-/// opened by descriptor, its fileName() is empty afterwards. On failure `file` stays closed.
+/// Opens `path` under the lock into `file`, which has to be closed, at offset 0 and without ever truncating it: whoever
+/// wants it empty truncates it under the lock. Shared opens it read-only, Exclusive for reading and writing. With
+/// IfAbsent::Create a missing file is made (mode 0666 less the umask).
+///
+/// It is the file that bore the name at some moment under the lock, never one that was deleted or replaced before the
+/// lock was gained. Closing `file` ends the lock. As always with a QFile that is opened by descriptor, its fileName() is
+/// empty afterwards. On failure `file` stays closed.
 KDD_EXPORT LockedOpenResult openLockedFile(QFile& file, const QString& path, FileLock lock, IfAbsent ifAbsent,
                                            LockPolling polling);
 
-/// Deletes the file at `path`, which `lockedFile` holds exclusively, and closes `lockedFile` in any case. False, with
-/// the reason in errno, when the system refuses; a file that is gone already counts as deleted.
+/// Deletes the file at `path`, which `lockedFile` holds exclusively, and closes `lockedFile` in any case. A file
+/// that is gone already counts as deleted.
 ///
 /// This is the one safe way to delete: those who wait for the lock notice and open the name anew.
-KDD_EXPORT bool removeLocked(QFile& lockedFile, const QString& path);
+KDD_EXPORT SystemResult removeLocked(QFile& lockedFile, const QString& path);
 
 }  // namespace Kdd

@@ -15,7 +15,6 @@
 #include <cerrno>
 #include <cstring>
 #include <limits>
-#include <system_error>
 
 namespace Kdd
 {
@@ -54,14 +53,15 @@ private:
     int mFd;
 };
 
-QString failed(const char* action, const QString& path, const QString& reason)
+SystemResult failed(const char* action, const QString& path, int error, const QString& reason)
 {
-    return QStringLiteral("cannot %1 %2: %3").arg(QString::fromLatin1(action), path, reason);
+    return SystemResult::failure(
+        error, QStringLiteral("cannot %1 %2: %3").arg(QString::fromLatin1(action), path, reason));
 }
 
-QString failed(const char* action, const QString& path, int error)
+SystemResult failed(const char* action, const QString& path, int error)
 {
-    return failed(action, path, QString::fromLocal8Bit(std::system_category().message(error).c_str()));
+    return failed(action, path, error, SystemResult::textOf(error));
 }
 
 int openFile(const QString& path, int flags, mode_t mode = 0)
@@ -148,11 +148,11 @@ bool emptyBuffers(QFile& file)
     return file.seek(file.size()) && file.seek(0);
 }
 
-QString removeJournal(const QString& path)
+SystemResult removeJournal(const QString& path)
 {
     const QString journal = journalPath(path);
     const bool gone = ::unlink(pathBytes(journal).constData()) == 0 || errno == ENOENT;
-    return gone ? QString() : failed("remove", journal, errno);
+    return gone ? SystemResult() : failed("remove", journal, errno);
 }
 
 quint32 checksum(const QByteArray& content)
@@ -182,7 +182,7 @@ int fillJournal(Descriptor& journal, const QByteArray& content, mode_t mode, Flu
     return error == 0 ? journal.close() : error;
 }
 
-QString writeJournal(const QString& path, const QByteArray& content, mode_t mode, Flush flush)
+SystemResult writeJournal(const QString& path, const QByteArray& content, mode_t mode, Flush flush)
 {
     const QString name = journalPath(path);
     // A link in place of the journal would lead the write into a foreign file.
@@ -224,12 +224,13 @@ JournalContent readJournal(int fd)
     QByteArray content(static_cast<int>(length), Qt::Uninitialized);
     if (const int error = readAll(fd, content, kHeaderSize))
         return {false, {}, error};
+    // The length alone does not tell: room that was never written reads as zeros after a loss of power.
     if (checksum(content) != qFromLittleEndian<quint32>(header.constData() + kChecksumAt))
         return {};
     return {true, content, 0};
 }
 
-QString reserveOrUndo(int fd, const QString& path, off_t formerSize, int newSize)
+SystemResult reserveOrUndo(int fd, const QString& path, off_t formerSize, int newSize)
 {
     const int error = reserve(fd, newSize);
     if (error == 0)
@@ -253,35 +254,35 @@ bool hasJournal(const QString& path)
     return ::lstat(pathBytes(journalPath(path)).constData(), &found) == 0;
 }
 
-QString writeInPlace(QFile& locked, const QString& path, const QByteArray& content, WriteOptions options)
+SystemResult writeInPlace(QFile& locked, const QString& path, const QByteArray& content, WriteOptions options)
 {
     // A torn file must be whole before its journal, the only copy of what belongs there, is overwritten.
-    QString reason = recoverInterruptedWrite(locked, path, options.flush);
-    if (!reason.isEmpty())
-        return reason;
+    SystemResult result = recoverInterruptedWrite(locked, path, options.flush);
+    if (result.bad())
+        return result;
     struct stat former = {};
     if (::fstat(locked.handle(), &former) != 0)
         return failed("examine", path, errno);
-    reason = writeJournal(path, content, former.st_mode & 0777, options.flush);
-    if (reason.isEmpty())
-        reason = reserveOrUndo(locked.handle(), path, former.st_size, content.size());
-    if (!reason.isEmpty())
-        return reason;
+    result = writeJournal(path, content, former.st_mode & 0777, options.flush);
+    if (result.good())
+        result = reserveOrUndo(locked.handle(), path, former.st_size, content.size());
+    if (result.bad())
+        return result;
     if (const int error = putInPlace(locked.handle(), content, options))
         return failed("write", path, error);
     return removeJournal(path);
 }
 
-QString recoverInterruptedWrite(QFile& locked, const QString& path, Flush flush)
+SystemResult recoverInterruptedWrite(QFile& locked, const QString& path, Flush flush)
 {
     if (!locked.isOpen())
         return failed("prepare", path, EBADF);
     if (!emptyBuffers(locked))
-        return failed("prepare", path, locked.errorString());
+        return failed("prepare", path, EIO, locked.errorString());
     const QString name = journalPath(path);
     const Descriptor journal(openFile(name, O_RDONLY | O_NOFOLLOW));
     if (journal.fd() < 0)
-        return errno == ENOENT ? QString() : failed("open", name, errno);
+        return errno == ENOENT ? SystemResult() : failed("open", name, errno);
     const JournalContent content = readJournal(journal.fd());
     if (content.error != 0)
         return failed("read", name, content.error);
@@ -292,14 +293,16 @@ QString recoverInterruptedWrite(QFile& locked, const QString& path, Flush flush)
     return removeJournal(path);
 }
 
-QString removeWithJournal(QFile& locked, const QString& path)
+SystemResult removeWithJournal(QFile& locked, const QString& path)
 {
-    QString reason = removeJournal(path);
-    if (!reason.isEmpty()) {
+    // The journal first: one without its file would become the content of the next file of that name.
+    SystemResult result = removeJournal(path);
+    if (result.bad()) {
         locked.close();
-        return reason;
+        return result;
     }
-    return removeLocked(locked, path) ? QString() : failed("remove", path, errno);
+    result = removeLocked(locked, path);
+    return result.good() ? result : failed("remove", path, result.error());
 }
 
 }  // namespace Kdd

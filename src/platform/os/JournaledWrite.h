@@ -1,5 +1,7 @@
 #pragma once
 
+#include "platform/os/SystemResult.h"
+
 #include <QByteArray>
 #include <QString>
 
@@ -44,25 +46,23 @@ bool hasJournal(const QString& path);
 
 /// Replaces the head of the file by `content`. A journal that an earlier writer left is recovered before.
 ///
-/// Returns an empty text when all is done, else the reason. Then either the file is untouched (the journal could
-/// not be written, or there is no room for the content: the room is reserved before the first old byte changes),
+/// On failure either the file is untouched (the journal could not be written, or there is no room for the content: the room is reserved before the first old byte changes),
 /// or the journal stays and the next recovery finishes the write.
 ///
 /// The system's errors are seen here and not at some later flush, because the write bypasses the buffer of
 /// `locked`. What that held for writing is flushed before; afterwards it stands at offset 0 and holds nothing.
-QString writeInPlace(QFile& locked, const QString& path, const QByteArray& content,
-                     WriteOptions options = {});
+SystemResult writeInPlace(QFile& locked, const QString& path, const QByteArray& content,
+                          WriteOptions options = {});
 
 /// For everyone who has just opened `path` exclusively. A complete journal is written into the file again, and
 /// removed when that is done; a damaged one is removed, for its writer had not yet touched the file. The file is not
 /// cut. Leaves `locked` at offset 0.
 ///
-/// Returns an empty text when the file is whole, also when there was no journal, else the reason; the journal and
-/// its promise are kept then.
-QString recoverInterruptedWrite(QFile& locked, const QString& path, Flush flush);
+/// Good when the file is whole, also when there was no journal; else the journal and its promise are kept.
+SystemResult recoverInterruptedWrite(QFile& locked, const QString& path, Flush flush);
 
 /// Deletes the file at `path` with its journal, which would otherwise bring the content back into the next file of
-/// that name, and closes `locked`. Returns an empty text, or the reason.
-QString removeWithJournal(QFile& locked, const QString& path);
+/// that name, and closes `locked`.
+SystemResult removeWithJournal(QFile& locked, const QString& path);
 
 }  // namespace Kdd

@@ -56,9 +56,11 @@ QByteArray pathBytes(const QString& path)
 
 bool makeFolder(const QString& path)
 {
+    // Not by Qt, which knows only names that are texts.
     const std::filesystem::path folder(pathBytes(path).toStdString());
     std::error_code error;
     std::filesystem::create_directories(folder, error);
+    // Asked for itself: another process may have made it meanwhile, which is no failure.
     return std::filesystem::is_directory(folder, error);
 }
 

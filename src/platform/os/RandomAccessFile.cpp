@@ -26,21 +26,19 @@ RandomAccessFile::~RandomAccessFile()
         ::close(mDescriptor);
 }
 
-int RandomAccessFile::open(const char* path)
+SystemResult RandomAccessFile::open(const char* path)
 {
     // A pipe in place of a file would hold the caller until somebody writes to it.
     mDescriptor = ::open(path, O_RDONLY | O_CLOEXEC | O_NONBLOCK);
-    if (mDescriptor < 0)
-        return errno;
     struct stat status = {};
-    if (::fstat(mDescriptor, &status) != 0)
-        return errno;
+    if (mDescriptor < 0 || ::fstat(mDescriptor, &status) != 0)
+        return SystemResult::of(errno);
     if (S_ISDIR(status.st_mode))
-        return EISDIR;
+        return SystemResult::of(EISDIR);
     if (!S_ISREG(status.st_mode))
-        return EINVAL;
+        return SystemResult::of(EINVAL);
     mIdentity = identityOf(status);
-    return 0;
+    return {};
 }
 
 bool RandomAccessFile::isUnchanged() const

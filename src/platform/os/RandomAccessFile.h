@@ -1,5 +1,7 @@
 #pragma once
 
+#include "platform/os/SystemResult.h"
+
 #include <QtGlobal>
 
 namespace Kdd
@@ -30,8 +32,8 @@ public:
     RandomAccessFile(const RandomAccessFile&) = delete;
     RandomAccessFile& operator=(const RandomAccessFile&) = delete;
 
-    /// Opens a regular file for reading; 0, else the errno that tells why not. To be called once.
-    int open(const char* path);
+    /// Opens a regular file for reading. To be called once.
+    SystemResult open(const char* path);
 
     /// [bytes], as it was when the file was opened.
     qint64 size() const { return mIdentity.size; }

@@ -1,7 +1,6 @@
 #include "platform/volume/KxCompressedDataMedia.h"
 
 #include "platform/base/LogFile.h"
-#include "platform/base/SystemFailure.h"
 #include "platform/os/PathName.h"
 #include "platform/os/RandomAccessFile.h"
 #include "platform/volume/ffmpeg/VideoModule.h"
@@ -30,9 +29,9 @@ class FileRange : public MediaSource
 public:
     Result open(const QString& path, qint64 offset, qint64 size)
     {
-        const int error = mFile.open(pathBytes(path).constData());
-        if (error != 0)
-            return systemFailure(error);
+        const Result opened = mFile.open(pathBytes(path).constData());
+        if (opened.bad())
+            return opened;
         if (offset < 0 || size <= 0 || offset >= mFile.size())
             return Result::failure(QStringLiteral("there are no %1 bytes at %2").arg(size).arg(offset));
         mOffset = offset;

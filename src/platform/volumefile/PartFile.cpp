@@ -1,6 +1,6 @@
 #include "platform/volumefile/PartFile.h"
 
-#include "platform/base/SystemFailure.h"
+#include "platform/os/SystemResult.h"
 
 #include <QRandomGenerator>
 
@@ -30,7 +30,7 @@ Result PartFile::create(const QByteArray& target)
     const QByteArray path = target + '.' + passing + ".part";
     mDescriptor = ::open(path.constData(), O_RDWR | O_CREAT | O_EXCL | O_CLOEXEC, 0666);
     if (mDescriptor < 0)
-        return systemFailure(errno).within(QStringLiteral("cannot be made"));
+        return Result(SystemResult::of(errno)).within(QStringLiteral("cannot be made"));
     mTarget = target;
     mPath = path;
     return {};
@@ -90,7 +90,8 @@ bool PartFile::read(qint64 at, void* bytes, std::size_t size)
 
 Result PartFile::state() const
 {
-    return mError == 0 ? Result() : systemFailure(mError).within(QStringLiteral("cannot be written"));
+    return mError == 0 ? Result()
+                       : Result(SystemResult::of(mError)).within(QStringLiteral("cannot be written"));
 }
 
 Result PartFile::publish()
@@ -103,7 +104,7 @@ Result PartFile::publish()
     if (mError != 0)
         return state();
     if (std::rename(mPath.constData(), mTarget.constData()) != 0)
-        return systemFailure(errno).within(QStringLiteral("cannot be named"));
+        return Result(SystemResult::of(errno)).within(QStringLiteral("cannot be named"));
     mPath.clear();
     return {};
 }

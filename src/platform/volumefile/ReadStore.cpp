@@ -1,6 +1,5 @@
 #include "platform/volumefile/ReadStore.h"
 
-#include "platform/base/SystemFailure.h"
 
 #include <cstring>
 #include <utility>
@@ -20,8 +19,7 @@ bool ReadStore::truncate(qint64 /*size*/)
 
 Result FileToRead::open(const QByteArray& path)
 {
-    const int error = mFile.open(path.constData());
-    return error == 0 ? Result() : systemFailure(error);
+    return mFile.open(path.constData());
 }
 
 bool FileToRead::read(qint64 at, void* bytes, std::size_t size)

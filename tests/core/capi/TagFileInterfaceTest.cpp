@@ -98,8 +98,9 @@ TEST(TagFileRemoval, IsTriedSixTimes)
     for (const int failures : {0, 1, 5, 6}) {
         const LogCapture log;
         int attempts = 0;
-        const bool isGone = removeTagFile(QStringLiteral("f"),
-                                          [&](const QString&) { return ++attempts > failures ? 0 : 21; });
+        const bool isGone = removeTagFile(QStringLiteral("f"), [&](const QString&) {
+            return SystemResult::of(++attempts > failures ? 0 : 21);
+        });
         EXPECT_EQ(isGone, failures < 6);
         EXPECT_EQ(attempts, std::min(failures + 1, 6));
         const std::string line = isGone

@@ -1,9 +1,9 @@
 #pragma once
 
 #include "kddlib/TagFileGenerator.h"
-#include "kddlib/tagfile/QAData.h"
 #include "kddlib/tagfile/StudyRecord.h"
 #include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagfile/qa/QAData.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/database/Catalogue.h"
 #include "platform/database/Kxg.h"

@@ -1,6 +1,6 @@
 #include "ArchiveFixture.h"
-#include "kddlib/tagfile/ImageOverlay.h"
-#include "kddlib/tagfile/QAAudit.h"
+#include "kddlib/tagfile/qa/ImageOverlay.h"
+#include "kddlib/tagfile/qa/QAAudit.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "support/LogCapture.h"

@@ -1,9 +1,6 @@
 #include "TagFileFixture.h"
 #include "platform/base/LogFile.h"
 
-#include <QtEndian>
-
-#include <libdeflate.h>
 #include <sys/resource.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -37,16 +34,6 @@ void fillDisk(qint64 size, sighandler_t action)
     ::signal(SIGXFSZ, action);
     const rlimit limit = {static_cast<rlim_t>(size), static_cast<rlim_t>(size)};
     ::setrlimit(RLIMIT_FSIZE, &limit);
-}
-
-/// The journal of a writer that was about to write the content.
-QByteArray journalOf(const QByteArray& content)
-{
-    QByteArray bytes("KDDJRNL1............");
-    const auto size = static_cast<size_t>(content.size());
-    qToLittleEndian(quint64{size}, bytes.data() + 8);
-    qToLittleEndian(libdeflate_crc32(0, content.constData(), size), bytes.data() + 16);
-    return bytes + content;
 }
 
 bool write(TagFile& file)

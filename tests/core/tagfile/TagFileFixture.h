@@ -4,6 +4,7 @@
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "support/DatasetBuilder.h"
+#include "support/FileContent.h"
 #include "support/LogCapture.h"
 #include "support/TemporaryStore.h"
 #include "support/TreeText.h"
@@ -82,19 +83,8 @@ protected:
     static QString journal() { return path() + QStringLiteral(".journal"); }
     static std::string named(const char* message) { return message + path().toStdString(); }
 
-    static void put(const QString& name, const QByteArray& content)
-    {
-        QDir().mkpath(QFileInfo(name).path());
-        QFile file(name);
-        ASSERT_TRUE(file.open(QIODevice::WriteOnly));
-        ASSERT_EQ(file.write(content), content.size());
-    }
-
-    static QByteArray content(const QString& name = path())
-    {
-        QFile file(name);
-        return file.open(QIODevice::ReadOnly) ? file.readAll() : QByteArray("(no file)");
-    }
+    static void put(const QString& name, const QByteArray& content) { putFile(name, content); }
+    static QByteArray content(const QString& name = path()) { return fileContent(name); }
 
     TemporaryStore mStore;
 };

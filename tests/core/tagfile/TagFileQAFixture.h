@@ -1,8 +1,8 @@
 #pragma once
 
 #include "TagFileFixture.h"
-#include "kddlib/tagfile/QAAudit.h"
-#include "kddlib/tagfile/QAData.h"
+#include "kddlib/tagfile/qa/QAAudit.h"
+#include "kddlib/tagfile/qa/QAData.h"
 #include "kddlib/volumes/Volume.h"
 #include "kddlib/volumes/VolumeInfo.h"
 

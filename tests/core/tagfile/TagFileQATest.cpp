@@ -2,7 +2,7 @@
 #include "kddlib/Limits.h"
 #include "kddlib/items/TextDecoding.h"
 #include "kddlib/items/TextEncoding.h"
-#include "kddlib/tagfile/QAEditor.h"
+#include "kddlib/tagfile/qa/QAEditor.h"
 
 #include <QDate>
 #include <QLocale>

@@ -1,5 +1,5 @@
 #include "TagFileFixture.h"
-#include "kddlib/tagfile/QAData.h"
+#include "kddlib/tagfile/qa/QAData.h"
 #include "kddlib/volumes/Volume.h"
 #include "kddlib/volumes/VolumeInfo.h"
 #include "platform/database/DirectoryEntry.h"

@@ -1,7 +1,7 @@
 #include "kddlib/archive/DatasetVerifier.h"
 
 #include "kddlib/Limits.h"
-#include "kddlib/tagfile/QAEditor.h"
+#include "kddlib/tagfile/qa/QAEditor.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/tagmodel/TagSequence.h"

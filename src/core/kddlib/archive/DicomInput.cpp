@@ -5,7 +5,6 @@
 #include "kddlib/net/dicom/DicomFileReader.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/VolumeInfo.h"
-#include "platform/base/SystemFailure.h"
 #include "platform/os/FileStatus.h"
 #include "platform/os/RandomAccessFile.h"
 #include "platform/volumefile/OrlanMesh.h"
@@ -150,8 +149,9 @@ DicomInput readDicomInput(const QByteArray& path, Damage damage)
     if (path.size() > Kxg::kMaxPath)
         return std::move(refuse(input, DicomInput::Kind::Unusable, QStringLiteral("Its path is too long")));
     RandomAccessFile file;
-    if (const int error = file.open(path.constData()))
-        return std::move(refuse(input, DicomInput::Kind::Unusable, systemFailure(error).text()));
+    const Result opened = file.open(path.constData());
+    if (opened.bad())
+        return std::move(refuse(input, DicomInput::Kind::Unusable, opened.text()));
     input.fileBytes = file.size();
     if (input.fileBytes == 0)
         return std::move(refuse(input, DicomInput::Kind::Unusable, QStringLiteral("The file is empty")));

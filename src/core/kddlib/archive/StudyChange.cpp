@@ -2,9 +2,9 @@
 
 #include "kddlib/archive/ArchiveDatabase.h"
 #include "kddlib/archive/StudyCompletion.h"
-#include "kddlib/tagfile/QAData.h"
 #include "kddlib/tagfile/StudyRecord.h"
 #include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagfile/qa/QAData.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
 #include "platform/os/FileStatus.h"

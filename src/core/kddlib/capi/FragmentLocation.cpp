@@ -77,7 +77,7 @@ bool locateFirstFragment(const char* path, DcmFileFormat& file, FragmentLocation
     const qint64 fragment = table + kItemHeaderSize + tableLength;
     // Looked at in the file itself: the parser's lengths may be those of a file that was replaced since.
     RandomAccessFile bytes;
-    if (bytes.open(path) != 0 || !hasItem(bytes, table, tableLength) || !hasItem(bytes, fragment, length))
+    if (bytes.open(path).bad() || !hasItem(bytes, table, tableLength) || !hasItem(bytes, fragment, length))
         return false;
     location = {fragment + kItemHeaderSize, length, sequence->card() == 2};
     return true;

@@ -1,7 +1,7 @@
 #include "kddlib/capi/Border.h"
 #include "kddlib/capi/kddtagfile.h"
-#include "kddlib/tagfile/QAData.h"
 #include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagfile/qa/QAData.h"
 #include "platform/base/LogFile.h"
 #include "platform/filecache/ExFileCache.h"
 

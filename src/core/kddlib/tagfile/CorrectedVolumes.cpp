@@ -61,6 +61,7 @@ CorrectedVolumes::Fate CorrectedVolumes::update(VolumeInfo& info, bool isForeign
         if (image != nullptr)
             holders.insert(image->parent());
     }
+    // Without corrections the file is right about itself, and what it names may only not have been read.
     if (!isAnyCorrected)
         return Fate::Whole;
     rename(info, keys);

@@ -1,6 +1,6 @@
 #pragma once
 
-#include "kddlib/tagfile/BuildCorrections.h"
+#include "kddlib/tagfile/qa/BuildCorrections.h"
 #include "kddlib/volumes/VolumeInfo.h"
 
 namespace Kdd

@@ -1,7 +1,6 @@
 #include "kddlib/tagfile/StudyRecord.h"
 
 #include "kddlib/items/TextDecoding.h"
-#include "kddlib/tagfile/TagFile.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/os/JournaledWrite.h"
@@ -69,13 +68,14 @@ Kxg::DicomFileRecord fileRecord(const TagMap& image, const QByteArray& path, con
     return record;
 }
 
-Kxg::BuiltStudy builtStudy(const TagFile& file)
+Kxg::BuiltStudy builtStudy(const QMap<QByteArray, TagMap*>& series, const Kxg::TagFileStamp& stamp)
 {
+    // By path, because the order of the tree is that of arrival: two builds of the same files must say the same.
     QMultiMap<QByteArray, const TagMap*> firstByPath;  // of each series
-    for (const TagMap* series : file.seriesByUID()) {
+    for (const TagMap* each : series) {
         const TagMap* first = nullptr;
         QByteArray firstPath;
-        for (const TagMap* image : series->children()) {
+        for (const TagMap* image : each->children()) {
             const QByteArray path = filePathOf(*image);
             if (first == nullptr || path < firstPath) {
                 first = image;
@@ -86,7 +86,7 @@ Kxg::BuiltStudy builtStudy(const TagFile& file)
             firstByPath.insert(firstPath, first);
     }
     Kxg::BuiltStudy built;
-    built.tagFile = file.stamp();
+    built.tagFile = stamp;
     for (auto it = firstByPath.cbegin(); it != firstByPath.cend(); ++it)
         built.series.push_back(fileRecord(*it.value(), it.key(), {}));
     return built;
@@ -94,8 +94,10 @@ Kxg::BuiltStudy builtStudy(const TagFile& file)
 
 bool isTagFile(const QString& path, const Kxg::TagFileStamp& stamp)
 {
+    // With a journal beside it, what the file says is about to change. It may be longer than its stamp, for one that was
+    // kept open keeps the old end of a longer study.
     RandomAccessFile file;
-    if (stamp.digest.isEmpty() || hasJournal(path) || file.open(pathBytes(path).constData()) != 0 ||
+    if (stamp.digest.isEmpty() || hasJournal(path) || file.open(pathBytes(path).constData()).bad() ||
         file.size() < stamp.size)
         return false;
     QByteArray content(static_cast<int>(stamp.size), Qt::Uninitialized);

@@ -1,141 +1,60 @@
 #include "kddlib/tagfile/TagFile.h"
 
 #include "kddlib/Limits.h"
-#include "kddlib/items/FileNaming.h"
+#include "kddlib/items/kdditemtm.h"
 #include "kddlib/net/dicom/KxDcmFileLoader.h"
-#include "kddlib/tagfile/NodeAttributes.h"
-#include "kddlib/tagmodel/OwnAttributes.h"
-#include "kddlib/tagmodel/TagElement.h"
+#include "kddlib/tagfile/DatabaseSync.h"
+#include "kddlib/tagfile/DatabaseValues.h"
+#include "kddlib/tagfile/SeriesLabels.h"
+#include "kddlib/tagfile/StoredStudy.h"
+#include "kddlib/tagfile/StudyPreviews.h"
+#include "kddlib/tagfile/StudyRecord.h"
+#include "kddlib/tagfile/StudyVolumes.h"
+#include "kddlib/tagfile/qa/QAJob.h"
+#include "kddlib/tagfile/qa/QAVolumes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
-#include "platform/base/Stopwatch.h"
-#include "platform/database/StorageManager.h"
-#include "platform/resources/ExResource.h"
+#include "platform/os/PathName.h"
 
-#include <dcmtk/dcmdata/dcdeftag.h>
 #include <dcmtk/dcmdata/dcfilefo.h>
 
-#include <algorithm>
-#include <mutex>
 #include <tuple>
 
 namespace Kdd
 {
 
-namespace
+struct TagFile::Private
 {
+    /// Keeps why an operation failed for whoever asks later.
+    bool note(const Result& result)
+    {
+        last = result;
+        return result.good();
+    }
 
-/// The caller's UIDs may be those of the very nodes that are removed.
-std::vector<QByteArray> textsOf(int count, const char** texts)
+    StudyTree& tree() { return study.tree(); }
+
+    StoredStudy study;
+    Result last;  // of reading, writing or merging
+};
+
+TagFile::TagFile()
+    : d(std::make_unique<Private>())
 {
-    return count > 0 ? std::vector<QByteArray>(texts, texts + count) : std::vector<QByteArray>();
 }
 
-}  // namespace
+TagFile::~TagFile() = default;
 
-TagFile::CompressionMode TagFile::sCompressionMode = CompressionMode::Zlib;
-Vec2i TagFile::sPreviewSize = {256, 256};
-unsigned int TagFile::sDebugOptions = 0;
-QByteArray TagFile::sMetaFolder;
-TagFile::Durability TagFile::sDurability = Durability::Process;
-
-TagFile::~TagFile()
-{
-    clear();
-}
-
-const char* TagFile::metaFolder()
-{
-    // A program that only has the C functions cannot set the folder at its start: threads may come here together.
-    static std::mutex mutex;
-    const std::lock_guard<std::mutex> lock(mutex);
-    if (!sMetaFolder.isEmpty())
-        return sMetaFolder.constData();
-    QByteArray configured = ExResource::metaFolder();
-    if (configured.isEmpty())
-        configured = Kxg::StorageManager::getMetaFolder();
-    // Not kept: a database that cannot be asked now may answer the next time.
-    if (configured.isEmpty())
-        return "./";
-    setMetaFolder(configured.constData());
-    return sMetaFolder.constData();
-}
-
-void TagFile::setMetaFolder(const char* path)
-{
-    sMetaFolder = QByteArray(path);
-    sMetaFolder.replace('\\', '/');
-    if (sMetaFolder.isEmpty())
-        sMetaFolder = ".";
-    if (!sMetaFolder.endsWith('/'))
-        sMetaFolder.append('/');
-    // A host that logs everything through a callback of its own would get the line before it is ready for lines.
-    if (LogFile::level() != LogFile::Level::Everything || !LogFile::hasCallback())
-        LogFile::printf("Meta folder set to %s", sMetaFolder.constData());
-}
+// ---- the tree
 
 QByteArray TagFile::imageKey(const TagMap& image)
 {
-    const QByteArray sopUID = image.uid(TagMap::ImageLevel);
-    return sopUID.isEmpty() ? forwardSlashes(filePathOf(image)) : sopUID;
+    return StudyTree::imageKey(image);
 }
 
 TagMap* TagFile::addTagMap(TagMap* map, const char* path, bool replace)
 {
-    std::unique_ptr<TagMap> image(map);
-    // The path may be what the image says that is about to be replaced.
-    const QByteArray givenPath(path);
-    const QByteArray studyUID = image->uid(TagMap::StudyLevel);
-    const QByteArray seriesUID = image->uid(TagMap::SeriesLevel);
-    QByteArray key = imageKey(*image);
-    const bool isKnownByPath = key.isEmpty() && path != nullptr;
-    if (isKnownByPath)
-        key = forwardSlashes(givenPath);
-    if (key.isEmpty() || (!mStudies.isEmpty() && mStudies.firstKey() != studyUID))
-        return nullptr;
-    if (TagMap* old = mImages.find(key)) {
-        if (old == map)
-            return image.release();
-        if (!replace)
-            return nullptr;
-        replaceImage(old, *image, seriesUID);
-    }
-    dropOfTheNode(*image);
-    mImages.insert(key, image.get());
-    placeInSeries(image.get(), seriesUID, studyUID);
-    if (path != nullptr)
-        image->putAndInsertValue(kFileSuffix, VrCode::LO, extractSuffix(givenPath.constData()));
-    if (isKnownByPath)
-        image->putAndInsertValue(kFilePath, VrCode::LO, givenPath);
-    return image.release();
-}
-
-/// In its series the new image takes the old one's places in the volumes, which know their images by UID.
-void TagFile::replaceImage(TagMap* old, TagMap& image, const QByteArray& seriesUID)
-{
-    TagMap* series = old->parent();
-    const bool staysInSeries = series != nullptr && series == findSeries(seriesUID);
-    if (staysInSeries)
-        image.takeVolumePlaces(*old);
-    delete old;
-    if (series != nullptr && series->children().isEmpty() && !staysInSeries)
-        dropSeries(series);
-}
-
-void TagFile::placeInSeries(TagMap* image, const QByteArray& seriesUID, const QByteArray& studyUID)
-{
-    if (TagMap* series = mSeries.value(seriesUID, nullptr)) {
-        attachBelow(*series, image, TagMap::ImageLevel);
-        return;
-    }
-    auto* series = new TagMap;
-    mSeries.insert(seriesUID, series);
-    attachBelow(*series, image, TagMap::ImageLevel);
-    std::shared_ptr<TagMap>& study = mStudies[studyUID];
-    if (study == nullptr)
-        study = std::make_shared<TagMap>();
-    holdInSeries(*study);
-    attachBelow(*study, series, TagMap::SeriesLevel);
+    return d->tree().add(map, path, replace);
 }
 
 TagMap* TagFile::addDataset(DcmDataset* dataset, const char* path, bool replace)
@@ -156,165 +75,107 @@ TagMap* TagFile::addDicomFile(const char* file, const char* path, bool replace)
 
 TagMap* TagFile::findSeries(const QByteArray& seriesUID) const
 {
-    return mSeries.value(seriesUID, nullptr);
+    return d->tree().findSeries(seriesUID);
 }
 
 TagMap* TagFile::findImage(const QByteArray& sopUID) const
 {
-    TagMap* image = mImages.find(sopUID);
-    // The path of an image without UID, as it was given.
-    return image != nullptr || !sopUID.contains('\\') ? image : mImages.find(forwardSlashes(sopUID));
+    return d->tree().findImage(sopUID);
 }
 
 TagMap* TagFile::findImage(const QByteArray& sopUID, const QByteArray& suffix) const
 {
-    TagMap* image = findImage(sopUID);
-    if (image == nullptr || suffix.isEmpty())
-        return image;
-    const TagElement* held = image->findElement(kFileSuffix);
-    return held == nullptr || held->value() == suffix ? image : nullptr;
+    return d->tree().findImage(sopUID, suffix);
+}
+
+std::shared_ptr<Item> TagFile::findImageEx(const QByteArray& sopUID, const QByteArray& suffix) const
+{
+    TagMap* image = findImage(sopUID, suffix);
+    if (image == nullptr)
+        return nullptr;
+    // The item shares the study: what it shows must stay when the tag file is cleared or read anew.
+    const StudyTree::Studies& studies = d->tree().studies();
+    const auto study = studies.constFind(image->uid(TagMap::StudyLevel));
+    return study != studies.cend() ? std::make_shared<ItemTM>(*image, *study) : nullptr;
 }
 
 TagMap* TagFile::takeImage(const QByteArray& sopUID)
 {
-    TagMap* image = findImage(sopUID);
-    if (image == nullptr)
-        return nullptr;
-    TagMap* copy = image->clone();
-    mImages.remove(image, sopUID);
-    delete image;
-    return copy;
+    return d->tree().takeImage(sopUID);
 }
 
 int TagFile::removeImages(int count, const char** sopUIDs)
 {
-    int removed = 0;
-    for (const QByteArray& sopUID : textsOf(count, sopUIDs)) {
-        TagMap* image = findImage(sopUID);
-        TagMap* series = image != nullptr ? image->parent() : nullptr;
-        if (series == nullptr)
-            continue;
-        mImages.remove(image, sopUID);
-        delete image;
-        ++removed;
-        TagMap* study = series->parent();
-        if (series->children().isEmpty() && study != nullptr) {
-            dropSeries(series);
-            dropStudyIfEmpty(study);
-        }
-    }
-    return removed;
+    return d->tree().removeImages(count, sopUIDs);
 }
 
 int TagFile::removeSeries(int count, const char** seriesUIDs)
 {
-    int removed = 0;
-    for (const QByteArray& seriesUID : textsOf(count, seriesUIDs)) {
-        TagMap* series = findSeries(seriesUID);
-        if (series == nullptr)
-            continue;
-        for (TagMap* image : series->children())
-            mImages.remove(image, imageKey(*image));
-        TagMap* study = series->parent();
-        dropSeries(series);
-        ++removed;
-        if (study != nullptr)
-            dropStudyIfEmpty(study);
-    }
-    return removed;
+    return d->tree().removeSeries(count, seriesUIDs);
 }
 
 void TagFile::removeImagesWithoutFilename(TagMap* series)
 {
-    for (int i = series->children().size() - 1; i >= 0; --i) {
-        TagMap* image = series->children().at(i);
-        if (!image->tagsForLevel().contains(kFilePath))
-            dropImage(image);
-    }
-}
-
-void TagFile::dropImage(TagMap* image)
-{
-    mImages.remove(image, imageKey(*image));
-    delete image;
-}
-
-/// A node that is deleted takes itself out of its parent. What it says of its UID may have changed since it was indexed.
-void TagFile::dropSeries(TagMap* series)
-{
-    const QByteArray uid = series->uid(TagMap::SeriesLevel);
-    mSeries.remove(mSeries.value(uid, nullptr) == series ? uid : mSeries.key(series));
-    delete series;
-}
-
-void TagFile::dropStudyIfEmpty(TagMap* study)
-{
-    if (!study->children().isEmpty())
-        return;
-    const auto holds = [study](const std::shared_ptr<TagMap>& each) { return each.get() == study; };
-    const auto at = std::find_if(mStudies.begin(), mStudies.end(), holds);
-    if (at != mStudies.end())
-        mStudies.erase(at);
+    d->tree().removeImagesWithoutFilename(*series);
 }
 
 void TagFile::deleteEmptyNodes()
 {
-    for (auto it = mSeries.begin(); it != mSeries.end();) {
-        if (it.value()->children().isEmpty()) {
-            delete it.value();
-            it = mSeries.erase(it);
-        } else {
-            ++it;
-        }
-    }
-    for (auto it = mStudies.begin(); it != mStudies.end();) {
-        if (it.value()->children().isEmpty())
-            it = mStudies.erase(it);
-        else
-            ++it;
-    }
+    d->tree().deleteEmptyNodes();
 }
 
 void TagFile::optimizeAll()
 {
-    if (debugOption(kMeasureUnoptimised))
-        mStatistics.unoptimisedSize = serialized(CompressionMode::None).size();
-    const Stopwatch stopwatch;
-    for (TagMap* series : qAsConst(mSeries))
-        series->optimizeAll();
-    for (const std::shared_ptr<TagMap>& study : qAsConst(mStudies))
-        study->optimizeAll();
-    deleteEmptyNodes();
-    mStatistics.optimiseMs = stopwatch.elapsed();
+    d->study.optimizeAll();
 }
 
 void TagFile::clear()
 {
-    mSeries.clear();
-    mImages = {};
-    mStudies.clear();
-    // The times of reading and writing tell of the file, not of what is held.
-    Statistics cleared;
-    cleared.readMs = mStatistics.readMs;
-    cleared.writeMs = mStatistics.writeMs;
-    mStatistics = cleared;
+    d->study.clear();
+}
+
+bool TagFile::isEmpty() const
+{
+    return d->tree().isEmpty();
 }
 
 QByteArray TagFile::studyInstanceUID() const
 {
-    return mStudies.isEmpty() ? QByteArray() : mStudies.firstKey();
+    return d->tree().studyInstanceUID();
 }
 
 std::shared_ptr<TagMap> TagFile::study() const
 {
-    return mStudies.isEmpty() ? nullptr : mStudies.first();
+    return d->tree().study();
+}
+
+const QMap<QByteArray, TagMap*>& TagFile::seriesByUID() const
+{
+    return d->tree().series();
+}
+
+const QMap<QByteArray, TagMap*>& TagFile::imagesByUID() const
+{
+    return d->tree().images();
 }
 
 TagFile::Statistics TagFile::statistics() const
 {
-    Statistics statistics = mStatistics;
-    statistics.series = mSeries.size();
-    statistics.images = mImages.inOrder().size();
+    const StoredStudy::Figures& figures = d->study.figures();
+    const FileSizes& sizes = figures.sizes;
+    Statistics statistics;
+    statistics.series = seriesByUID().size();
+    statistics.images = imagesByUID().size();
+    statistics.volumes = sizes.volumes;
+    statistics.blobs = sizes.blobs;
+    statistics.optimiseMs = figures.optimiseMs;
+    statistics.readMs = figures.readMs;
+    statistics.writeMs = figures.writeMs;
+    statistics.storedSize = sizes.storedSize;
+    statistics.uncompressedSize = sizes.uncompressedSize;
+    statistics.unoptimisedSize = figures.unoptimisedSize;
+    statistics.blobBytes = sizes.blobBytes;
+    statistics.missingBlobs = sizes.missingBlobs;
     return statistics;
 }
 
@@ -328,6 +189,190 @@ void TagFile::getStatistics(int& series, int& images, int& volumes, int& blobs, 
              unoptimisedSize, blobBytes) =
         std::tie(all.series, all.images, all.volumes, all.blobs, all.optimiseMs, all.readMs, all.writeMs,
                  all.storedSize, all.uncompressedSize, all.unoptimisedSize, all.blobBytes);
+}
+
+// ---- the file
+
+QString TagFile::cacheFilePath() const
+{
+    return cacheFilePathForStudy(studyInstanceUID().constData());
+}
+
+bool TagFile::readCacheFile(const QString& path, const char* studyUID, bool keepOpen)
+{
+    return d->note(d->study.read(path, studyUID, keepOpen, StoredStudy::Reader::Ordinary));
+}
+
+bool TagFile::readCacheFileForStudy(const char* studyUID, bool keepOpen)
+{
+    return readCacheFile(cacheFilePathForStudy(studyUID), studyUID, keepOpen);
+}
+
+bool TagFile::readWhenFree(const QString& path, const char* studyUID, bool keepOpen)
+{
+    return d->note(d->study.read(path, studyUID, keepOpen, StoredStudy::Reader::Serving));
+}
+
+bool TagFile::readWhenFreeForStudy(const char* studyUID, bool keepOpen)
+{
+    return readWhenFree(cacheFilePathForStudy(studyUID), studyUID, keepOpen);
+}
+
+bool TagFile::readCacheFile(QDataStream& in, const char* studyUID)
+{
+    return d->note(d->study.read(in, studyUID));
+}
+
+bool TagFile::writeCacheFile()
+{
+    return d->note(d->study.write());
+}
+
+bool TagFile::writeCacheFile(const char* path)
+{
+    return d->note(d->study.write(pathText(path)));
+}
+
+bool TagFile::writeCacheFile(QDataStream& out)
+{
+    return d->note(d->study.write(out));
+}
+
+bool TagFile::mergeIntoCacheFile()
+{
+    return d->note(d->study.merge());
+}
+
+bool TagFile::close()
+{
+    if (!d->study.file().isOpen())
+        return false;
+    d->study.file().close();
+    return true;
+}
+
+const Kxg::TagFileStamp& TagFile::stamp() const
+{
+    return d->study.stamp();
+}
+
+const QString& TagFile::failure() const
+{
+    return d->last.text();
+}
+
+bool TagFile::wasLockedOut() const
+{
+    return d->study.wasLockedOut();
+}
+
+// Here, because records of studies are a part of tag files and know nothing of the whole.
+Kxg::BuiltStudy builtStudy(const TagFile& file)
+{
+    return builtStudy(file.seriesByUID(), file.stamp());
+}
+
+// ---- volumes
+
+void TagFile::addVolumeInfo(const std::vector<VolumeInfo*>& infos)
+{
+    StudyVolumes::add(d->tree(), infos);
+}
+
+void TagFile::createVolumes()
+{
+    // Volumes come from volume files alone; nothing is left to be made from the images.
+}
+
+void TagFile::addDividedVolume(const VolumeInfo& info)
+{
+    QAVolumes::addDivided(d->tree(), info);
+}
+
+void TagFile::keepVolumesOf(TagFile& former, const QSet<QByteArray>& suffixes)
+{
+    QAVolumes::keep(d->tree(), former.d->tree(), suffixes);
+}
+
+// ---- previews
+
+void TagFile::selectPreviewImages2D(QList<QByteArray>& uids) const
+{
+    uids = selectPreviewImages(d->tree());
+}
+
+// NOLINTNEXTLINE(readability-convert-member-functions-to-static): of one form with those that find the image
+bool TagFile::addPreview(TagMap* image, DcmDataset* dataset, const QString& path)
+{
+    return Kdd::addPreview(image, dataset, path);
+}
+
+// NOLINTNEXTLINE(readability-convert-member-functions-to-static): the same
+bool TagFile::addPreview(TagMap* image, const QByteArray& file)
+{
+    return Kdd::addPreview(image, file);
+}
+
+bool TagFile::addPreview(const QByteArray& sopInstanceUID, const QString& path)
+{
+    return addPreview(findImage(sopInstanceUID), pathBytes(path));
+}
+
+bool TagFile::addPreview(DcmDataset* dataset, const QString& path)
+{
+    return Kdd::addPreview(d->tree(), dataset, path);
+}
+
+int TagFile::exportPreviews(const QString& folder) const
+{
+    return Kdd::exportPreviews(d->tree(), folder);
+}
+
+// ---- corrections
+
+bool TagFile::applyQA(QAData& job, QString& message)
+{
+    const Result result = QAJob(job).run();
+    message = result.text();
+    return result.good();
+}
+
+void TagFile::updateVolumesAfterQA(QASeriesMove& move)
+{
+    QAVolumes::giveBack(d->tree(), move);
+}
+
+// ---- the image database
+
+int TagFile::addDicomFilePaths(TagMap* series, const Kxg::SeriesInfo* info, bool createMissing,
+                               bool& complete)
+{
+    return DatabaseValues(d->tree()).addFilePaths(series, info, createMissing, complete);
+}
+
+void TagFile::addVolumeFilePath(TagMap* series, const Kxg::DicomDirectoryEntry& entry, bool createMissing)
+{
+    DatabaseValues::addVolumeFilePath(series, entry, createMissing);
+}
+
+void TagFile::copyDatabaseValuesIntoTagMap(const Kxg::DicomDirectoryEntry& entry)
+{
+    DatabaseValues(d->tree()).copyStudy(entry);
+}
+
+void TagFile::createAbstractTags()
+{
+    createLabels(d->tree());
+}
+
+bool TagFile::readAndSync(const char* studyUID, const char* /*user*/)
+{
+    return Kdd::readAndSync(d->study, studyUID, d->last);
+}
+
+bool TagFile::syncWithDatabase(const std::shared_ptr<Kxg::DicomDirectoryEntry>& study)
+{
+    return Kdd::syncWithDatabase(d->tree(), study);
 }
 
 }  // namespace Kdd

@@ -1,20 +1,15 @@
 #pragma once
 
+#include "kddlib/tagfile/TagFileSettings.h"
 #include "platform/base/Export.h"
-#include "platform/base/Geometry.h"
-#include "platform/database/TagFileStamp.h"
 
 #include <QByteArray>
-#include <QFile>
-#include <QHash>
 #include <QList>
 #include <QMap>
 #include <QSet>
 #include <QString>
-#include <QVector>
 
 #include <memory>
-#include <string>
 #include <vector>
 
 class DcmDataset;
@@ -23,8 +18,8 @@ class QDataStream;
 namespace Kxg
 {
 struct DicomDirectoryEntry;
-struct ImageFile;
 struct SeriesInfo;
+struct TagFileStamp;
 }  // namespace Kxg
 
 namespace Kdd
@@ -35,12 +30,9 @@ class TagMap;
 struct QAData;
 struct QASeriesMove;
 struct VolumeInfo;
-struct LockPolling;
-struct LockedOpenResult;
-enum class Flush;
-enum class IfAbsent;
 
-/// One study's metadata cache: the tree study, series, image of `TagMap`s with indexes by UID, and its file.
+/// One study's metadata cache: the tree study, series, image of `TagMap`s with indexes by UID, and its file. The one door
+/// to all that is done with them; what holds for all tag files of the process is inherited.
 ///
 /// The object owns the study, the study its series, a series its images. The indexes only point into the tree. An
 /// image without SOP Instance UID, of which a few kinds of DICOM objects exist, is known by its file path instead.
@@ -49,46 +41,13 @@ enum class IfAbsent;
 /// exclusively open from before it is read until after it is written, and readers never see it half-written.
 /// Every write is first put into a journal beside the file ("<file>.journal"), so that a process that dies in the
 /// middle of it leaves nothing torn; whoever opens the file next finishes the write.
-class KDD_EXPORT TagFile
+class KDD_EXPORT TagFile : public TagFileSettings
 {
 public:
-    enum class CompressionMode { None = 0, Zlib = 1, Lzma = 2 };
-
-    /// What a write must survive.
-    enum class Durability {
-        Process,    ///< the death of the process; the operating system writes to disk when it sees fit
-        PowerLoss,  ///< flushed to disk before the write returns
-    };
-
-    /// Bits of `setDebugOptions`: tell how long corrections take, measure the size before optimisation.
-    static constexpr unsigned int kTimings = 1;
-    static constexpr unsigned int kMeasureUnoptimised = 2;
-
-    TagFile() = default;
+    TagFile();
     ~TagFile();
     TagFile(const TagFile&) = delete;
     TagFile& operator=(const TagFile&) = delete;
-
-    // ---- class-wide settings, made once at start and not locked
-
-    static CompressionMode compressionMode() { return sCompressionMode; }
-    static void setCompressionMode(CompressionMode mode) { sCompressionMode = mode; }
-
-    /// Width and height that previews fit into [pixels].
-    static Vec2i previewSize() { return sPreviewSize; }
-    static void setPreviewSize(const Vec2i& size) { sPreviewSize = size; }
-
-    static void setDebugOptions(unsigned int options) { sDebugOptions = options; }
-
-    /// Whether any of the bits is set.
-    static bool debugOption(unsigned int bits) { return (sDebugOptions & bits) != 0; }
-
-    /// The folder above all tag files; ends in "/". Until one is set it is what the site's settings say, else the image
-    /// database, else "./". May be asked for on any thread.
-    static const char* metaFolder();
-    static void setMetaFolder(const char* path);
-
-    static void setDurability(Durability durability) { sDurability = durability; }
 
     // ---- the tree
 
@@ -134,14 +93,14 @@ public:
     void optimizeAll();
 
     void clear();
-    bool isEmpty() const { return mStudies.isEmpty(); }
+    bool isEmpty() const;
 
     /// Of the study held; empty when there is none.
     QByteArray studyInstanceUID() const;
     std::shared_ptr<TagMap> study() const;
 
-    const QMap<QByteArray, TagMap*>& seriesByUID() const { return mSeries; }
-    const QMap<QByteArray, TagMap*>& imagesByUID() const { return mImages.inOrder(); }
+    const QMap<QByteArray, TagMap*>& seriesByUID() const;
+    const QMap<QByteArray, TagMap*>& imagesByUID() const;
 
     /// Counts of the present tree, and times [ms] and sizes [bytes] of its last optimisation, reading and writing.
     struct Statistics
@@ -170,8 +129,7 @@ public:
 
     // ---- the file
 
-    /// Where the study's file lies: two folder levels and a name made from the MD5 of the UID, under the meta folder.
-    static QString cacheFilePathForStudy(const char* studyUID);
+    /// Where the file of the study held lies.
     QString cacheFilePath() const;
 
     /// Reads the file at `path`; with `studyUID` not null only that study. With `keepOpen` the file is opened
@@ -251,9 +209,10 @@ public:
     /// there before the files are written, so that every later build makes it again.
     ///
     /// False, with the reason in `message`, when a study could not be claimed, a file could not be held, read or written,
-    /// the database could not be reached, or when a value cannot be replaced without losing something. Then both files are as they were, but for one case that the message tells: a
-    /// move whose images stand in both studies. As after the death of the process in the middle, running the job again
-    /// completes it. A job whose old study is its study becomes an edit.
+    /// the database could not be reached, or when a value cannot be replaced without losing something. Then both files are
+    /// as they were, but for one case that the message tells: a move whose images stand in both studies. As after the
+    /// death of the process in the middle, running the job again completes it. A job whose old study is its study becomes
+    /// an edit.
     static bool applyQA(QAData& job, QString& message);
 
     /// Gives back the volumes that were taken out of a series before its images changed: each part of a volume to the
@@ -289,130 +248,22 @@ public:
     bool syncWithDatabase(const std::shared_ptr<Kxg::DicomDirectoryEntry>& study);
 
     /// Of the file that this object wrote last; empty before.
-    const Kxg::TagFileStamp& stamp() const { return mStamp; }
+    const Kxg::TagFileStamp& stamp() const;
 
     /// Why the last read, write or merge failed, in words; empty after success.
-    const QString& failure() const { return mFailure; }
+    const QString& failure() const;
 
     /// Whether it failed because others held the file all the time, or were just making it, so that trying again makes
     /// sense and nothing is known of the study.
-    bool wasLockedOut() const { return mLockedOut; }
+    bool wasLockedOut() const;
 
     /// Closes the file held open; false if there is none.
     bool close();
 
 private:
-    using StudyIndex = QMap<QByteArray, std::shared_ptr<TagMap>>;
-    using NodeIndex = QMap<QByteArray, TagMap*>;
+    struct Private;
 
-    /// Images in the order of their UIDs for whoever walks through all of them, and hashed for requests: among UIDs
-    /// that differ in their last digits only, the search in order is the largest part of a request.
-    class ImageIndex
-    {
-    public:
-        TagMap* find(const QByteArray& uid) const { return mHashed.value(uid, nullptr); }
-        const NodeIndex& inOrder() const { return mInOrder; }
-
-        void insert(const QByteArray& uid, TagMap* image)
-        {
-            mInOrder.insert(uid, image);
-            mHashed.insert(uid, image);
-        }
-
-        TagMap* take(const QByteArray& uid)
-        {
-            mHashed.remove(uid);
-            return mInOrder.take(uid);
-        }
-
-        /// Lets go of an image, by its key if it still stands under that: what the key was made from may have changed.
-        void remove(TagMap* image, const QByteArray& key)
-        {
-            take(find(key) == image ? key : mInOrder.key(image));
-        }
-
-    private:
-        NodeIndex mInOrder;
-        QHash<QByteArray, TagMap*> mHashed;
-    };
-
-    struct Indexes
-    {
-        StudyIndex studies;
-        NodeIndex series;
-        ImageIndex images;
-    };
-
-    class BodyReader;
-    class BodyWriter;
-    class DatabaseView;
-    class QAJob;
-    class QAVolumes;
-
-    void replaceImage(TagMap* old, TagMap& image, const QByteArray& seriesUID);
-    void placeInSeries(TagMap* image, const QByteArray& seriesUID, const QByteArray& studyUID);
-    void dropSeries(TagMap* series);
-    void dropImage(TagMap* image);
-    void dropStudyIfEmpty(TagMap* study);
-    static void forgetUnseen(TagMap& node);
-
-    TagMap* makeImage(TagMap* series, const Kxg::ImageFile& file);
-    TagMap* findImage(const Kxg::ImageFile& file) const;
-    bool syncSeries(TagMap& series, const Kxg::DicomDirectoryEntry& entry);
-    bool removeUnlisted(const DatabaseView& view);
-
-    QVector<TagMap*> imagesOf(const VolumeInfo& info, int volumeIndex) const;
-
-    /// Makes sure that a reader will rebuild the same images for each slice of every volume; a volume that lost its last
-    /// image goes. Else the reason, with the images of every volume as they were.
-    static QString settleVolumes(TagMap& series);
-    static void renumberVolumes(TagMap& series);
-    static void releaseImagesOfOthers(const TagMap& series);
-
-    bool write(QDataStream& out, CompressionMode mode);
-    QByteArray serialized(CompressionMode mode);
-    void recordSizes(qint64 storedBody, qint64 body, const QList<QByteArray>& blobs);
-
-    bool fail(const QString& reason);
-    bool failReading(const char* reason);
-    bool failMerge(const QString& reason);
-
-    enum class Reader { Ordinary, Serving };
-
-    static Flush flushing();
-    static LockPolling pollingOf(Reader reader);
-    bool readFile(const QString& path, const char* studyUID, bool keepOpen, Reader reader);
-    bool openForReading(const QString& path, bool keepOpen, Reader reader);
-    bool openWhole(const QString& path, Reader reader);
-    bool failToOpen(const LockedOpenResult& opened);
-    bool finishInterruptedWrite(const QString& path);
-    bool holdStudy(const QByteArray& studyUID, IfAbsent ifAbsent);
-    bool createAndWrite(const QString& path);
-    bool writeInto(QFile& locked, const QString& path, bool cut);
-
-    void swapIndexes(Indexes& indexes);
-    bool openForMerge(QFile& file, const QString& path);
-    bool readForMerge(QFile& file, const QString& path, const QByteArray& studyUID);
-    void mergeFresh(const Indexes& fresh);
-    void copyImages(const TagMap& from, TagMap& to);
-    void mergeSeries(TagMap* series, const QByteArray& seriesUID, TagMap& freshStudy, TagMap& study);
-
-    StudyIndex mStudies;
-    NodeIndex mSeries;
-    ImageIndex mImages;
-    QFile mCacheFile;
-    QString mCacheFilePath;
-    QString mFailure;
-    bool mLockedOut = false;
-    Kxg::TagFileStamp mStamp;
-
-    Statistics mStatistics;  // but for series and images, which the indexes count
-
-    static CompressionMode sCompressionMode;
-    static Vec2i sPreviewSize;
-    static unsigned int sDebugOptions;
-    static QByteArray sMetaFolder;
-    static Durability sDurability;
+    std::unique_ptr<Private> d;
 };
 
 }  // namespace Kdd

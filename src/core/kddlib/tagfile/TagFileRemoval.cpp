@@ -6,7 +6,6 @@
 
 #include <QFile>
 
-#include <cerrno>
 #include <chrono>
 #include <thread>
 
@@ -19,37 +18,36 @@ namespace
 const char* const kCategory = "TagFile";
 constexpr int kRetries = 5;
 constexpr std::chrono::milliseconds kPause(10);
-constexpr LockPolling kOnce{1, 0};
+constexpr LockPolling kOnce{1, 0};  // who removes has its own pauses, and tells how many it took
 
 }  // namespace
 
-int removeTagFileOnce(const QString& path)
+SystemResult removeTagFileOnce(const QString& path)
 {
+    // Through the lock: a file deleted under a writer would take with it what that writes.
     QFile file;
     const LockedOpenResult opened = openLockedFile(file, path, FileLock::Exclusive, IfAbsent::Fail, kOnce);
-    if (!opened)
-        return opened.failure == OpenFailure::NotFound ? 0 : opened.systemError;
-    errno = 0;
-    if (removeWithJournal(file, path).isEmpty())
-        return 0;
-    return errno != 0 ? errno : EIO;
+    if (opened)
+        return removeWithJournal(file, path);
+    return opened.failure == OpenFailure::NotFound ? SystemResult() : opened.result();
 }
 
 bool removeTagFile(const QString& path, const RemovalAttempt& attempt)
 {
-    int error = attempt(path);
-    if (error == 0)
+    SystemResult result = attempt(path);
+    if (result.good())
         return true;
     for (int retry = 1; retry <= kRetries; ++retry) {
         std::this_thread::sleep_for(kPause);
-        error = attempt(path);
-        if (error == 0) {
+        result = attempt(path);
+        if (result.good()) {
             LogFile::tracef(0, kCategory, "Tag file %s successfully deleted after %d retries",
                             qUtf8Printable(path), retry);
             return true;
         }
     }
-    LogFile::tracef(3, kCategory, "Tag file %s could not be deleted (errno %d)", qUtf8Printable(path), error);
+    LogFile::tracef(3, kCategory, "Tag file %s could not be deleted (errno %d)", qUtf8Printable(path),
+                    result.error());
     return false;
 }
 

@@ -1,5 +1,7 @@
 #pragma once
 
+#include "platform/os/SystemResult.h"
+
 #include <QString>
 
 #include <functional>
@@ -7,11 +9,11 @@
 namespace Kdd
 {
 
-/// One attempt to delete the file at a path: 0 when there is none any more, else the errno that tells why there is.
-using RemovalAttempt = std::function<int(const QString& path)>;
+/// One attempt to delete the file at a path: good when there is none any more.
+using RemovalAttempt = std::function<SystemResult(const QString& path)>;
 
 /// Takes the lock of a tag file without waiting and deletes it with its journal.
-int removeTagFileOnce(const QString& path);
+SystemResult removeTagFileOnce(const QString& path);
 
 /// Attempts to delete a tag file, and when that fails five times more, 10 ms apart. Whether it is gone; logs what took
 /// more than one attempt.

@@ -243,9 +243,14 @@ public:
     static int readLength(KxMsg& in);
 
 protected:
-    friend class TagFile;
+    friend class DatabaseValues;
+    friend class StudyBodyReader;
+    friend class StudyBodyWriter;
+    friend class StudyMerge;
+    friend class StudyTree;
     friend class TagSequence;
     friend class VolumeImages;
+    friend class VolumeSettling;
 
     /// Hangs a child below this node as it is, and takes it over: it inherits all it does not hold, and neither node
     /// gives or loses an attribute.

@@ -193,8 +193,10 @@ public:
     void deserializeExtraData(KxMsg& in);
 
 protected:
-    friend class TagFile;
+    friend class QAVolumes;
+    friend class StudyVolumes;
     friend class TagMap;
+    friend class VolumeSettling;
 
     /// Makes these the images, sorted by Instance Number and then by SOP Instance UID; the slices stay.
     /// Without images `single` is appended to those already there, unless it is null.

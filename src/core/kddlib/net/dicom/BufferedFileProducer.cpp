@@ -21,8 +21,9 @@ makeOFConditionConst(EC_FileChanged, OFM_dcmdata, 0x301, OF_error,
 BufferedFileProducer::BufferedFileProducer(const char* path)
     : mWindow(std::make_unique<char[]>(kWindow))
 {
-    if (const int error = mFile.open(path))
-        mStatus = makeOFCondition(OFM_dcmdata, 18, OF_error, std::strerror(error));
+    const Result opened = mFile.open(path);
+    if (opened.bad())
+        mStatus = makeOFCondition(OFM_dcmdata, 18, OF_error, opened.text().toLocal8Bit().constData());
 }
 
 BufferedFileProducer::BufferedFileProducer(const char* path, qint64 offset, const FileIdentity& identity)

@@ -31,7 +31,7 @@ bool readWhole(const char* path, QByteArray& bytes)
 {
     RandomAccessFile file;
     // All in memory, for elements are looked at in any order; the bound keeps a damaged length from taking it all.
-    if (file.open(path) != 0 || file.size() > kMaxFileBytes)
+    if (file.open(path).bad() || file.size() > kMaxFileBytes)
         return false;
     bytes.resize(static_cast<int>(file.size()));
     return file.readAt(0, bytes.data(), bytes.size()) == bytes.size();

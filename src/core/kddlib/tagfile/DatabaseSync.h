@@ -1,0 +1,29 @@
+#pragma once
+
+#include "platform/base/Result.h"
+
+#include <QByteArray>
+
+#include <memory>
+
+namespace Kxg
+{
+struct DicomDirectoryEntry;
+}  // namespace Kxg
+
+namespace Kdd
+{
+
+class StoredStudy;
+class StudyTree;
+
+/// Brings a tree into line with what the database says of its study: file paths, volume names, series that are gone. An
+/// image that a correction moved here or renamed stays. Another study's entry is refused. Whether anything changed.
+bool syncWithDatabase(StudyTree& tree, const std::shared_ptr<Kxg::DicomDirectoryEntry>& study);
+
+/// Reads the study's tag file and brings it into line with the image database, in memory only. False when the database
+/// does not know the study or cannot be asked, or when the file cannot be read, which all is logged. `read` is what came
+/// of the reading, as it was when it did not come to that.
+bool readAndSync(StoredStudy& held, const QByteArray& studyUID, Result& read);
+
+}  // namespace Kdd

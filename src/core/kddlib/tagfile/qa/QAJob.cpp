@@ -1,0 +1,247 @@
+#include "kddlib/tagfile/qa/QAJob.h"
+
+#include "kddlib/tagfile/NodeAttributes.h"
+#include "kddlib/tagfile/SeriesLabels.h"
+#include "kddlib/tagfile/qa/QAEditor.h"
+#include "kddlib/tagfile/qa/QAVolumes.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
+#include "kddlib/tagmodel/TagElement.h"
+#include "kddlib/tagmodel/TagMap.h"
+#include "platform/base/LogFile.h"
+#include "platform/base/Stopwatch.h"
+
+#include <dcmtk/dcmdata/dcdeftag.h>
+
+#include <algorithm>
+
+namespace Kdd
+{
+
+namespace
+{
+
+const char* const kCategory = "TagFileQA";
+const char* const kInBothStudies = "until the job is run again its images may stand in both studies";
+
+/// A failure with what it leaves behind.
+Result leaving(const QString& reason, const QString& left)
+{
+    return Result::failure(reason + QStringLiteral("; ") + left);
+}
+
+/// Whether an image inherits what the node holds.
+bool isSeenBelow(const TagMap& node, const DcmTagKey& key)
+{
+    return std::any_of(node.children().begin(), node.children().end(), [&](const TagMap* child) {
+        return !child->tagsForLevel().contains(key) &&
+               (child->children().isEmpty() || isSeenBelow(*child, key));
+    });
+}
+
+/// Markers that hide a value that is not there any more.
+void forgetMarkersBelow(const TagMap& node, const DcmTagKey& key)
+{
+    for (TagMap* child : node.children()) {
+        const TagElement* own = child->tagsForLevel().value(key, nullptr);
+        if (own != nullptr && !own->markedAsMissing())
+            continue;
+        child->deleteElement(key);
+        forgetMarkersBelow(*child, key);
+    }
+}
+
+/// Removes what a node holds and no image below shows: it belonged to images that left.
+void forgetUnseen(TagMap& node)
+{
+    const QList<DcmTagKey> keys = node.tagsForLevel().keys();
+    for (const DcmTagKey& key : keys) {
+        if (isOfTheNode(key) || isSeenBelow(node, key))
+            continue;
+        node.deleteElement(key);
+        if (node.findElement(key) == nullptr)
+            forgetMarkersBelow(node, key);
+    }
+}
+
+}  // namespace
+
+QAJob::~QAJob()
+{
+    // What was made to be held and was not needed goes again before anyone else can open it.
+    mDestination.file().removeIfNeverWritten();
+}
+
+Result QAJob::run()
+{
+    const Stopwatch total;
+    Result result = prepare();
+    if (result.good())
+        result = claim();
+    if (result.good())
+        result = hold();
+    if (result.bad())
+        return result;
+    const int readMs = total.elapsed();
+    mSourceHasLabels = hasLabels(mSource.tree());
+    mDestinationHasLabels = hasLabels(mDestination.tree().isEmpty() ? mSource.tree() : mDestination.tree());
+    result = applyToImages();
+    const Stopwatch writing;
+    if (result.good() && (mJob.outcome.changed > 0 || mJob.outcome.moved > 0))
+        result = write();
+    if (result.bad())
+        return result;
+    const int optimiseMs = mDestination.figures().optimiseMs;
+    if (TagFileSettings::debugOption(TagFileSettings::kTimings)) {
+        LogFile::tracef(
+            1, kCategory, "%s: Total=%d Read=%d Optimize=%d Write=%d (%d images, %d changed, %d not found)",
+            mIsMove ? "Move" : "Edit", total.elapsed(), readMs, optimiseMs, writing.elapsed() - optimiseMs,
+            mJob.images.size(), mJob.outcome.changed, mJob.outcome.notFound.size());
+    }
+    return {};
+}
+
+Result QAJob::prepare()
+{
+    mJob.outcome = {};
+    if (mJob.oldStudyUID == mJob.studyUID)
+        mJob.oldStudyUID.clear();
+    mIsMove = !mJob.oldStudyUID.isEmpty();
+    Result result = check(mJob);
+    if (result.bad())
+        return result;
+    auditTime(mJob.timestamp, mTime);
+    if (!mJob.login.isEmpty())
+        mTime += QLatin1Char(' ') + QString::fromLatin1(mJob.login);
+    mReordersImages =
+        std::any_of(mJob.substitutions.cbegin(), mJob.substitutions.cend(), [](const QASubstitution& each) {
+            return movesImages(each.key) || each.key == DCM_InstanceNumber;
+        });
+    return result;
+}
+
+// ---- holding the studies
+
+/// Whoever builds a study claims it first and holds its file then.
+Result QAJob::claim()
+{
+    Result result = mRecord.claim(mJob);
+    mJob.outcome.isLockedOut = mRecord.wasLockedOut();
+    return result;
+}
+
+/// All hold the files in the same order: two that each have what the other waits for would both give up.
+Result QAJob::hold()
+{
+    if (!mIsMove)
+        return hold(mDestination, mJob.studyUID, IfAbsent::Fail);
+    const bool isSourceFirst = TagFileSettings::cacheFilePathForStudy(mJob.oldStudyUID.constData()) <
+                               TagFileSettings::cacheFilePathForStudy(mJob.studyUID.constData());
+    Result result;
+    if (isSourceFirst)
+        result = hold(mSource, mJob.oldStudyUID, IfAbsent::Fail);
+    // A study that is new is made at once, for others may be about to make it as well.
+    if (result.good())
+        result = hold(mDestination, mJob.studyUID, IfAbsent::Create);
+    if (result.bad())
+        return result;
+    // To be put back when the source cannot be written, for then the images must not stand here as well.
+    mBefore = mDestination.file().content();
+    return isSourceFirst ? result : hold(mSource, mJob.oldStudyUID, IfAbsent::Fail);
+}
+
+Result QAJob::hold(StoredStudy& study, const QByteArray& studyUID, IfAbsent ifAbsent)
+{
+    Result held = study.hold(studyUID, ifAbsent);
+    if (held.good())
+        return held;
+    mJob.outcome.isLockedOut = study.wasLockedOut();
+    return held.within(
+        QStringLiteral("The tag file of study %1 cannot be changed").arg(QString::fromLatin1(studyUID)));
+}
+
+// ---- writing
+
+void QAJob::tidy()
+{
+    // Volumes first: they may give images to a series that is empty so far.
+    for (auto& each : mMoves)
+        QAVolumes::giveBack(mDestination.tree(), each.second);
+    mSource.tree().deleteEmptyNodes();
+    mDestination.tree().deleteEmptyNodes();
+    for (const Series& each : mLeft) {
+        if (TagMap* series = each.first->findSeries(each.second))
+            forgetUnseen(*series);
+        if (each.first->study() != nullptr)
+            forgetUnseen(*each.first->study());
+    }
+    if (!mLeft.empty() && mDestinationHasLabels)
+        createLabels(mDestination.tree());
+    if (!mLeft.empty() && mSourceHasLabels)
+        createLabels(mSource.tree());
+    mDestination.optimizeAll();
+}
+
+Result QAJob::record()
+{
+    Result result = mRecord.record();
+    mJob.outcome.isLockedOut = mRecord.wasLockedOut();
+    return result;
+}
+
+/// The image database comes first: what it knows the next build makes, whatever becomes of this process. Of the files
+/// the destination comes first: at every moment each image stands in the one study, in the other or in both.
+Result QAJob::write()
+{
+    tidy();
+    Result result = record();
+    if (result.bad())
+        return result;
+    if (!mDestination.tree().isEmpty())
+        result = mDestination.writeHeld();
+    if (result.bad()) {
+        // A journal is a promise: whoever opens the destination next gives it the images that the source still has.
+        const bool isPromised = mIsMove && mDestination.file().hasJournal();
+        return isPromised ? leaving(result.text(), QLatin1String(kInBothStudies))
+                          : failWriting(result.text());
+    }
+    if (mIsMove)
+        result = writeSource();
+    if (result.bad())
+        return result;
+    // Only now: until the files are written, a build must make the corrections from what was recorded.
+    mRecord.finish(mDestination.tree(), mDestination.stamp(), mJob.studyUID);
+    if (mIsMove)
+        mRecord.finish(mSource.tree(), mSource.stamp(), mJob.oldStudyUID);
+    return result;
+}
+
+Result QAJob::writeSource()
+{
+    const bool isEmpty = mSource.tree().isEmpty();
+    Result written = isEmpty ? mSource.write() : mSource.writeHeld();
+    if (written.good())
+        return written;
+    // Of a file that the system would not remove nobody knows whether it is gone.
+    if (isEmpty || !takeBack())
+        return leaving(written.text(), QLatin1String(kInBothStudies));
+    return failWriting(written.text());
+}
+
+/// With the files as they were.
+Result QAJob::failWriting(const QString& reason)
+{
+    const Result takenBack = mRecord.takeBack();
+    return takenBack.good() ? Result::failure(reason) : leaving(reason, takenBack.text());
+}
+
+/// Makes the destination what it was, because the source could not be written. But what the source has a journal for
+/// is a promise, and its images will leave it. False when the images stand in both studies then.
+bool QAJob::takeBack()
+{
+    StudyFile& file = mDestination.file();
+    if (mSource.file().hasJournal())
+        return false;
+    return (mBefore.isEmpty() ? file.remove() : file.write(mBefore, Tail::Cut)).good();
+}
+
+}  // namespace Kdd

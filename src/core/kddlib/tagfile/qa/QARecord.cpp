@@ -1,0 +1,322 @@
+#include "kddlib/tagfile/qa/QARecord.h"
+
+#include "kddlib/tagfile/StudyRecord.h"
+#include "kddlib/tagfile/StudyTree.h"
+#include "kddlib/tagfile/TagFileSettings.h"
+#include "kddlib/tagfile/qa/BuildCorrections.h"
+#include "kddlib/tagfile/qa/QAData.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
+#include "kddlib/tagmodel/TagMap.h"
+#include "platform/base/LogFile.h"
+#include "platform/database/Kxg.h"
+
+#include <dcmtk/dcmdata/dcdeftag.h>
+
+#include <algorithm>
+
+namespace Kdd
+{
+
+namespace
+{
+
+/// As long as tag files are waited for [ms].
+constexpr int kPatience = 400;
+
+const char* const kNotKept = "The correction could not be kept";
+
+/// Whether `log` goes on where the image's log ended before the job, and with these changes.
+bool tellsOf(const QAImageChange& change, const AuditLog& log)
+{
+    return isContinued(change.before, change.changes, log);
+}
+
+/// Of an image that was never corrected before.
+Kxg::ImageCorrection noCorrection(const ImageIdentity& identity, const QByteArray& seriesUID)
+{
+    return {identity.studyUID, identity.image, identity.studyUID, seriesUID, identity.image, QByteArray()};
+}
+
+bool isHeld(const Kxg::StudyContents& contents, const QByteArray& key)
+{
+    return std::any_of(contents.images.begin(), contents.images.end(),
+                       [&](const Kxg::ListedImage& listed) { return key == listed.key(); });
+}
+
+}  // namespace
+
+QARecord::~QARecord()
+{
+    for (auto& each : mStudies) {
+        // One that was made and got no images is nobody's.
+        if (each.second.isMade && mRequests.isEmpty())
+            each.second.claim->finishRemoved();
+    }
+}
+
+Result QARecord::claim(const QAData& job)
+{
+    const QByteArray address = Kxg::DatabaseServer();
+    if (address.isEmpty())
+        return {};
+    Result result;
+    std::unique_ptr<Kxg::Catalogue> catalogue = Kxg::Catalogue::open(address, result);
+    QList<QByteArray> uids = {job.studyUID};
+    if (!job.oldStudyUID.isEmpty())
+        uids.append(job.oldStudyUID);
+    // The order of the files, so that two jobs that each move images to the other's study do not wait for each other.
+    std::sort(uids.begin(), uids.end(), [](const QByteArray& a, const QByteArray& b) {
+        return TagFileSettings::cacheFilePathForStudy(a.constData()) <
+               TagFileSettings::cacheFilePathForStudy(b.constData());
+    });
+    QVector<QByteArray> known;
+    for (const QByteArray& uid : qAsConst(uids)) {
+        QVector<QByteArray> found;
+        if (result.good())
+            result = catalogue->findStudies(uid, 1, found);
+        if (found.contains(uid))
+            known.append(uid);
+    }
+    if (result.bad())
+        return result.within(QString::fromLatin1(kNotKept));
+    // Images that no database lists are not built again either, so there is nobody to be told.
+    if (known.isEmpty())
+        return {};
+    mCatalogue = std::move(catalogue);
+    for (const QByteArray& uid : qAsConst(uids)) {
+        const bool isDestination = uid == job.studyUID;
+        if (!isDestination && !known.contains(uid))
+            continue;
+        result = claimOne(uid, isDestination);
+        if (result.bad())
+            return result;
+        const auto claimed = mStudies.find(uid);
+        if (claimed != mStudies.end())
+            claimed->second.isMade = !known.contains(uid);
+    }
+    return {};
+}
+
+Result QARecord::lockedOut(const QString& reason)
+{
+    mIsLockedOut = true;
+    return Result::failure(reason);
+}
+
+/// The destination is made when it is not there. Another study may have lost its last image and be gone meanwhile.
+Result QARecord::claimOne(const QByteArray& studyUID, bool isDestination)
+{
+    using Making = Kxg::Catalogue::IfAbsent;
+    std::unique_ptr<Kxg::StudyClaim> claim;
+    QVector<QByteArray> found;
+    const Result result =
+        mCatalogue->claim(studyUID, kPatience, claim, isDestination ? Making::Create : Making::Fail);
+    const QString study = QString::fromLatin1(studyUID);
+    if (result.bad() && mCatalogue->findStudies(studyUID, 1, found).good() && !found.contains(studyUID))
+        return {};
+    if (result.bad())
+        return result.within(QStringLiteral("Study %1 cannot be claimed").arg(study));
+    if (claim == nullptr)
+        return lockedOut(QStringLiteral("Study %1 is being worked on by another process").arg(study));
+    Study& claimed = mStudies[studyUID];
+    claimed.claim = std::move(claim);
+    return {};
+}
+
+/// Once the tag files are held.
+Result QARecord::read()
+{
+    Result result;
+    for (auto& each : mStudies) {
+        Study& study = each.second;
+        if (result.good())
+            result = mCatalogue->studyContents(each.first, study.contents);
+        if (result.good())
+            result = mCatalogue->corrections(each.first, study.corrections);
+        const Kxg::TagFileStamp& stamp = study.contents.tagFile;
+        study.isRecognised = stamp.digest.isEmpty() ||
+                             isTagFile(TagFileSettings::cacheFilePathForStudy(each.first.constData()), stamp);
+    }
+    return result;
+}
+
+// ---- which image it was
+
+const Kxg::ImageCorrection* QARecord::findShown(const QByteArray& studyUID, const QByteArray& key,
+                                                const AuditLog& log) const
+{
+    const Kxg::ImageCorrection* found = nullptr;
+    const auto study = mStudies.find(studyUID);
+    if (study == mStudies.end())
+        return nullptr;
+    // Two files may be shown as the same image, one in front of the other: their logs tell them apart.
+    for (const Kxg::ImageCorrection& each : study->second.corrections) {
+        if (each.shownStudyUID == studyUID && each.shownImage == key &&
+            (found == nullptr || logOf(each).text() == log.text()))
+            found = &each;
+    }
+    return found;
+}
+
+const Kxg::ImageCorrection* QARecord::find(const ImageIdentity& identity) const
+{
+    for (const auto& study : mStudies) {
+        for (const Kxg::ImageCorrection& each : study.second.corrections) {
+            if (ImageIdentity{each.studyInstanceUID, each.image} == identity)
+                return &each;
+        }
+    }
+    return nullptr;
+}
+
+/// The correction that is to be replaced, without changes when there is none yet. False when the database knows of one
+/// that the tag file does not show: its study waits to be built.
+bool QARecord::identify(const QAImageChange& change, Kxg::ImageCorrection& former)
+{
+    if (const Kxg::ImageCorrection* shown = findShown(change.studyUID, change.key, change.before)) {
+        former = *shown;
+        const AuditLog log = logOf(*shown);
+        return isSameOrContinued(log, change.before) || tellsOf(change, log);
+    }
+    const QByteArray studyNow = change.holder->studyInstanceUID();
+    const Kxg::ImageCorrection* there = findShown(studyNow, change.keyNow, change.before);
+    const Kxg::ImageCorrection* left = find({change.studyUID, change.key});
+    for (const Kxg::ImageCorrection* each : {there, left}) {
+        // An earlier run of this job ended when only the database was done.
+        if (each != nullptr && tellsOf(change, logOf(*each))) {
+            former = *each;
+            return true;
+        }
+    }
+    if (left != nullptr)
+        return false;
+    former = noCorrection({change.studyUID, change.key}, change.seriesUID);
+    const auto study = mStudies.find(change.studyUID);
+    const bool isListed = study != mStudies.end() && isHeld(study->second.contents, change.key);
+    return isListed || identifyByLog(change, former);
+}
+
+/// An image that a correction of which the database knows nothing moved here.
+bool QARecord::identifyByLog(const QAImageChange& change, Kxg::ImageCorrection& former)
+{
+    const TagMap* image = change.holder->findImage(change.keyNow);
+    const ImageIdentity identity =
+        identityBefore(change.before, {change.studyUID, change.key}, filePathOf(*image));
+    std::vector<Kxg::ImageCorrection> known;
+    if (mCatalogue->corrections(identity.studyUID, known).bad())
+        return false;
+    for (const Kxg::ImageCorrection& each : known) {
+        if (ImageIdentity{each.studyInstanceUID, each.image} == identity)
+            return false;
+    }
+    former = noCorrection(identity, change.seriesUID);
+    return true;
+}
+
+// ---- keeping it
+
+Result QARecord::record()
+{
+    if (mCatalogue == nullptr)
+        return {};
+    Result result = read();
+    for (const QAImageChange& change : mChanges) {
+        Kxg::ImageCorrection former;
+        if (result.bad())
+            break;
+        // A later change of the same job may have given its place to another image.
+        if (change.holder->findImage(change.keyNow) == nullptr)
+            continue;
+        if (change.wasThereAlready &&
+            findShown(change.holder->studyInstanceUID(), change.keyNow, change.before) != nullptr)
+            continue;
+        if (!identify(change, former)) {
+            const QString reason =
+                QStringLiteral("Image %1: study %2 is to be built first, for its tag file does not "
+                               "show an earlier correction yet")
+                    .arg(QString::fromLatin1(change.key), QString::fromLatin1(change.studyUID));
+            // It came into being after this job had asked for it: now it can be claimed as well.
+            if (mStudies.find(change.studyUID) == mStudies.end())
+                return lockedOut(reason);
+            mCatalogue->requestBuild({change.studyUID}, Kxg::Catalogue::IfGone::PassOver);
+            return Result::failure(reason);
+        }
+        result = add(change, former);
+        mIsFinal = mIsFinal || change.replacedAnother;
+    }
+    if (result.good() && !mRecorded.empty())
+        result = mCatalogue->recordCorrections(mRecorded, mRequests);
+    return result.within(QString::fromLatin1(kNotKept));
+}
+
+Result QARecord::add(const QAImageChange& change, const Kxg::ImageCorrection& former)
+{
+    const TagMap* image = change.holder->findImage(change.keyNow);
+    ImageOverlay overlay;
+    if (!former.changes.isEmpty() && !overlay.decode(former.changes))
+        return Result::failure(
+            QStringLiteral("what the image database has of earlier corrections of image %1 "
+                           "is damaged")
+                .arg(QString::fromLatin1(change.key)));
+    for (const AuditChange& each : change.changes) {
+        if (each.key != DCM_PixelData)
+            overlay.note(*image, each.key);
+    }
+    overlay.noteLogged(*image);
+    const QByteArray seriesUID = overlay.seriesOf(*image);
+    mFormer.push_back(former);
+    if (seriesUID.isEmpty() && former.shownStudyUID == change.holder->studyInstanceUID())
+        mFormer.back().shownSeriesUID.clear();
+    mRecorded.push_back({former.studyInstanceUID, former.image, change.holder->studyInstanceUID(), seriesUID,
+                         change.keyNow, overlay.encode()});
+    return {};
+}
+
+Result QARecord::takeBack()
+{
+    if (mRecorded.empty())
+        return {};
+    // Files of the image that was replaced would go along.
+    if (mIsFinal)
+        return Result::failure(
+            QStringLiteral("the image database keeps the correction, and the next build makes it"));
+    QMap<QByteArray, qint64> requests;
+    const Result result = mCatalogue->recordCorrections(mFormer, requests);
+    if (result.bad())
+        return Result::failure(
+            QStringLiteral("the image database keeps the correction (%1), and the next build makes it")
+                .arg(result.text()));
+    mCatalogue->finishRequests(mRequests.values().toVector() + requests.values().toVector());
+    mRequests.clear();
+    mRecorded.clear();
+    return {};
+}
+
+void QARecord::finish(const StudyTree& tree, const Kxg::TagFileStamp& stamp, const QByteArray& studyUID)
+{
+    const auto found = mStudies.find(studyUID);
+    const qint64 request = mRequests.value(studyUID, 0);
+    // A tag file that was not the one that the database knows may lack more than this correction.
+    if (found == mStudies.end() || request == 0 || !found->second.isRecognised)
+        return;
+    Study& study = found->second;
+    Result result;
+    if (!tree.isEmpty()) {
+        result = study.claim->finishChange(builtStudy(tree.series(), stamp), request);
+    } else {
+        Kxg::StudyContents left;
+        result = mCatalogue->studyContents(studyUID, left);
+        const bool isGone = left.images.empty() && left.volumes.isEmpty();
+        if (result.good() && isGone)
+            result = mCatalogue->finishRequests({request});
+        if (result.good() && isGone)
+            result = study.claim->finishRemoved();
+        else if (result.good() && left.images.empty())
+            result = study.claim->finishChange({}, request);
+    }
+    if (result.bad())
+        LogFile::warnf("Study %s is built once more: %s", studyUID.constData(),
+                       qUtf8Printable(result.text()));
+}
+
+}  // namespace Kdd

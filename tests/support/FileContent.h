@@ -1,0 +1,32 @@
+#pragma once
+
+#include <QByteArray>
+#include <QString>
+#include <QTemporaryDir>
+
+#include <gtest/gtest.h>
+
+namespace Kdd
+{
+
+/// Writes a file and the folder that it is missing.
+void putFile(const QString& path, const QByteArray& content);
+
+/// "(no file)" when there is none.
+QByteArray fileContent(const QString& path);
+
+/// The journal of a writer that was about to write the content.
+QByteArray journalOf(const QByteArray& content);
+
+/// A file, absent at first, in a folder of its own.
+class FileTest : public testing::Test
+{
+protected:
+    QString path() const { return mFolder.filePath(QStringLiteral("file")); }
+    QByteArray content() const { return fileContent(path()); }
+
+private:
+    QTemporaryDir mFolder;
+};
+
+}  // namespace Kdd
