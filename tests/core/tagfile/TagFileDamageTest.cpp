@@ -280,8 +280,10 @@ TEST_F(TagFileDamage, CompressedBodiesThatAnnounceTooMuchAreRefused)
 
 TEST_F(TagFileDamage, MoreElementsOrItemsThanAnyStudyHasAreRefused)
 {
+#ifndef __SANITIZE_ADDRESS__  // which takes a minute for so many small pieces of memory
     const QByteArray markers = head(DCM_PatientID, VrCode::Missing).repeated(kMaxElements + 1);
     EXPECT_EQ(imagesRead(framed(study(markers))), kRefused);
+#endif
     const QByteArray items = sequence(length(kMaxElements + 1), length(0).repeated(kMaxElements + 1));
     EXPECT_EQ(imagesReadInSmallMemory(framed(study(items))), kRefused);
 }
