@@ -51,6 +51,8 @@ set(KDD_PUBLIC_HEADERS
   core/kddlib/tagmodel/TagElement.h
   core/kddlib/tagmodel/TagMap.h
   core/kddlib/tagmodel/TagSequence.h
+  core/kddlib/tagmodel/VolumeHolder.h
+  core/kddlib/tagmodel/VolumeImages.h
   core/kddlib/tagmodel/VrCode.h
   core/kddlib/volumes/FrameTags.h
   core/kddlib/volumes/LowResolution.h
@@ -60,7 +62,6 @@ set(KDD_PUBLIC_HEADERS
   core/kddlib/volumes/StackWriter.h
   core/kddlib/volumes/Vec3d.h
   core/kddlib/volumes/Volume.h
-  core/kddlib/volumes/VolumeImages.h
   core/kddlib/volumes/VolumeInfo.h
   platform/base/BuildInfo.h
   platform/base/CreateUIDs.h

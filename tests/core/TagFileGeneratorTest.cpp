@@ -1,48 +1,23 @@
 #include "kddlib/TagFileGenerator.h"
 
-#include "kddlib/tagfile/TagFile.h"
+#include "core/tagfile/ArchiveFixture.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
-#include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/Volume.h"
-#include "platform/database/Catalogue.h"
-#include "platform/database/Kxg.h"
-#include "platform/volumefile/OrlanMeshWriter.h"
-#include "platform/volumefile/SOPInstanceUtility.h"
-#include "support/DatasetBuilder.h"
 #include "support/HttpServer.h"
 #include "support/LogCapture.h"
-#include "support/TemporaryStore.h"
 
-#include <QFile>
 #include <QImage>
-
-#include <gtest/gtest.h>
 
 namespace Kdd
 {
 namespace
 {
 
-const DcmTagKey kFilePath(0x0006, 0x7100);
-const DcmTagKey kPreview(0x0006, 0x7105);
-const DcmTagKey kHasVolumeFile(0x0006, 0x7108);
-
-constexpr int kSize = 32;  // of every picture [pixels]
-
 /// An archive of files in a folder of its own, registered in a database there.
-class GeneratorTest : public testing::Test
+class GeneratorTest : public ArchiveTest
 {
 protected:
-    GeneratorTest()
-    {
-        Kxg::SetDatabaseServer("sqlite:" + mStore.filePath("database").toLocal8Bit());
-        Result result;
-        database = Kxg::Catalogue::open(Kxg::DatabaseServer(), result);
-        EXPECT_TRUE(result.good()) << qPrintable(result.text());
-    }
-
-    QByteArray path(const QByteArray& name) const { return mStore.folder().toLocal8Bit() + '/' + name; }
-
     /// A square image whose right half is bright.
     static DatasetBuilder aPicture(const char* sopUID, const char* number)
     {
@@ -62,14 +37,6 @@ protected:
             .with(DCM_InstanceNumber, number);
     }
 
-    static QByteArray halfBright()
-    {
-        QByteArray pixels(kSize * kSize, '\0');
-        for (int i = 0; i < pixels.size(); ++i)
-            pixels[i] = i % kSize < kSize / 2 ? '\x10' : '\xf0';
-        return pixels;
-    }
-
     /// Writes the file and has it registered, as part of the study that its dataset names or of another.
     void addFile(const DatasetBuilder& image, const QByteArray& name, const QByteArray& studyUID = "1.2")
     {
@@ -85,56 +52,19 @@ protected:
 
     /// A volume file of the images named, one slice each, whose slices are like `aPicture`.
     void addVolume(const QByteArray& name, const std::vector<std::string>& sopUIDs,
-                   const QMap<QByteArray, QByteArray>& attributes = {})
+                   QMap<QByteArray, QByteArray> attributes = {})
     {
+        attributes.insert("G0020-000E", "UI:1.2.3");
         writeVolume(name, sopUIDs, attributes);
         registerVolume(path(name));
     }
 
     void registerVolume(const QByteArray& place) { registerFiles({{}, {{place, {}, "1.2", "1.2.3"}}, {}}); }
 
-    void writeVolume(const QByteArray& name, const std::vector<std::string>& sopUIDs,
-                     const QMap<QByteArray, QByteArray>& attributes = {})
-    {
-        Result result;
-        const int slices = qMax(1, static_cast<int>(sopUIDs.size()));
-        const Lattice lattice{"Level0", {kSize, kSize, slices}, PrimitiveType::UInt8, 1};
-        const auto writer = OrlanMeshWriter::create(path(name), lattice, result);
-        ASSERT_NE(writer, nullptr) << qPrintable(result.text());
-        const TypedData2D pixels{kSize, kSize, 1, PrimitiveType::UInt8, halfBright()};
-        for (int z = 0; z < slices; ++z)
-            ASSERT_TRUE(writer->writeSlice(z, pixels).good());
-        ParamBundle dicom;
-        dicom.insert("G0020-000E", Parameter::ofText("UI:1.2.3"));
-        for (auto it = attributes.cbegin(); it != attributes.cend(); ++it)
-            dicom.insert(it.key(), Parameter::ofText(it.value()));
-        ParamBundle parameters;
-        parameters.insertBundle("DICOM", dicom);
-        parameters.insertBundle("SOPInstanceUIDs", SOPInstanceUtility::bundleOf(sopUIDs));
-        parameters.insert("BoundingBox", Parameter::ofReals({0, 31, 0, 31, -5, 5}));
-        parameters.insert("PaddingValue", Parameter::ofIntegers({7}));
-        parameters.insert("PaddingRangeMin", Parameter::ofIntegers({1}));
-        parameters.insert("PaddingRangeMax", Parameter::ofIntegers({2}));
-        if (mRange != 0)
-            parameters.insert("DataMinMax", Parameter::ofIntegers({0, mRange}));
-        ASSERT_TRUE(writer->writeParameters(parameters).good());
-        if (mBins != 0) {
-            EXPECT_TRUE(writer->writeDataSection("Histogram", QVector<quint64>(mBins, 1)).good());
-        }
-        ASSERT_TRUE(writer->finish().good());
-    }
-
-    void registerFiles(const Kxg::FileRecords& files)
-    {
-        QMap<QByteArray, qint64> requests;
-        const Result result = database->registerFiles(files, requests);
-        ASSERT_TRUE(result.good()) << qPrintable(result.text());
-    }
-
     bool build(TagFile& file, const char* studyUID = "1.2")
     {
         std::vector<Kxg::StudySummary> studies;
-        EXPECT_TRUE(database->listStudies(studies).good());
+        EXPECT_TRUE(mCatalogue->listStudies(studies).good());
         return !studies.empty() && TagFileGenerator().createTagFile(file, studies.front().id, studyUID);
     }
 
@@ -144,11 +74,6 @@ protected:
         node->findAndGetInt(key, value);
         return value;
     }
-
-    TemporaryStore mStore;
-    std::unique_ptr<Kxg::Catalogue> database;
-    int mBins = 0;   // of the histograms of volume files
-    int mRange = 0;  // their greatest value, if it is told
 };
 
 TEST_F(GeneratorTest, AFileIsTakenForWhatItIsWhereNothingWasSaidOfIt)
@@ -160,7 +85,7 @@ TEST_F(GeneratorTest, AFileIsTakenForWhatItIsWhereNothingWasSaidOfIt)
     registerFiles({{record}, {}, {}});
     TagFile built;
     std::vector<Kxg::StudySummary> studies;
-    ASSERT_TRUE(database->listStudies(studies).good());
+    ASSERT_TRUE(mCatalogue->listStudies(studies).good());
     ASSERT_EQ(studies.size(), 1U);
     EXPECT_TRUE(TagFileGenerator().createTagFile(built, studies.front().id, nullptr));
     EXPECT_NE(built.findImage("1"), nullptr);
@@ -244,7 +169,7 @@ TEST_F(GeneratorTest, ASyncRemovesImagesWhoseSeriesHasOnlyAVolumeFileLeft)
     addVolume("1.2.3-volume.vol", {"8", "9"});
     TagFile file;
     ASSERT_TRUE(build(file));
-    ASSERT_TRUE(database->removeFiles({path("8"), path("9")}).good());
+    ASSERT_TRUE(mCatalogue->removeFiles({path("8"), path("9")}).good());
     ASSERT_TRUE(file.readAndSync("1.2", ""));
     EXPECT_TRUE(file.imagesByUID().isEmpty());
     EXPECT_EQ(file.seriesByUID().keys(), QList<QByteArray>{"1.2.3"});

@@ -1,6 +1,5 @@
 #include "platform/volumefile/ReadStore.h"
 
-
 #include <cstring>
 #include <utility>
 

@@ -1,5 +1,5 @@
 #include "CatalogueFixture.h"
-#include "support/Files.h"
+#include "support/FileContent.h"
 #include "support/HttpServer.h"
 #include "support/ObjectServer.h"
 
@@ -47,7 +47,7 @@ protected:
 TEST_F(Examples, FetchAnObject)
 {
     EXPECT_EQ(run(KDD_FETCH_OBJECT, {url("object"), target()}), "200000 of 200000 bytes\n0");
-    EXPECT_EQ(contentOf(target()), object);
+    EXPECT_EQ(fileContent(target()), object);
     EXPECT_EQ(run(KDD_FETCH_OBJECT, {url("absent"), target()}), "1");
     EXPECT_EQ(run(KDD_FETCH_OBJECT, {QStringLiteral("ftp://a"), target()}), "2");
 }
@@ -75,7 +75,7 @@ TEST_F(Examples, SaveASyncedTagFile)
     ASSERT_TRUE(mCatalogue->setConfig("Storage", "MetaFolder", TagFile::metaFolder()).good());
     const QString database = QString::fromUtf8(mAddress);
     const std::string printed = run(KDD_SYNCED_TAG_FILE, {database, QStringLiteral("1.2"), target()});
-    EXPECT_EQ(printed, std::to_string(contentOf(target()).size()) + " bytes\n0");
+    EXPECT_EQ(printed, std::to_string(fileContent(target()).size()) + " bytes\n0");
     TagFile file;
     ASSERT_TRUE(file.readCacheFile(target(), "1.2", false));
     EXPECT_EQ(file.imagesByUID().keys(), QList<QByteArray>{"2"});

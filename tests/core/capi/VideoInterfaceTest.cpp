@@ -3,7 +3,7 @@
 #include "kddlib/net/dicom/DicomFileReader.h"
 #include "platform/volume/FragmentReader.h"
 #include "support/DatasetBuilder.h"
-#include "support/Files.h"
+#include "support/FileContent.h"
 #include "support/LogCapture.h"
 #include "support/RealFiles.h"
 
@@ -58,7 +58,7 @@ protected:
         uint64_t offset = 1, length = 1;
         const int result = GetVideoMetaInfo(path().toLocal8Bit().constData(), uid, &cineRate, &transferSyntax,
                                             &offset, &length);
-        const QByteArray bytes = contentOf(path()).mid(static_cast<int>(offset), static_cast<int>(length));
+        const QByteArray bytes = fileContent(path()).mid(static_cast<int>(offset), static_cast<int>(length));
         std::ostringstream text;
         text << uid << ' ' << cineRate << "/s " << transferSyntax << ' ';
         text << (length == 0 ? "none at " + std::to_string(offset) : bytes.toStdString());
@@ -105,12 +105,12 @@ TEST_F(VideoInterface, IsToldFromWhatEncapsulatedVideosHold)
 TEST_F(VideoInterface, NoPartOfAFileIsMistakenForItsVideo)
 {
     save(movie(), item({}) + item("a video!"));
-    const QByteArray whole = contentOf(path());
+    const QByteArray whole = fileContent(path());
     const LogCapture log;
     for (int size = 0; size < whole.size() - 16; ++size) {
         ASSERT_TRUE(QFile::resize(path(), size));
         ASSERT_EQ(told().first, KDD_NOT_READ) << size;
-        writeFile(path(), whole);
+        putFile(path(), whole);
     }
 }
 
@@ -149,7 +149,7 @@ TEST(FragmentLocation, IsThatOfEveryRealFile)
             if (readDicomFile(path.toLocal8Bit().constData(), file).bad())
                 continue;
             const bool isLocated = locateFirstFragment(path.toLocal8Bit().constData(), file, location);
-            const QByteArray bytes = isLocated ? contentOf(path) : QByteArray();
+            const QByteArray bytes = isLocated ? fileContent(path) : QByteArray();
             EXPECT_EQ(bytes.mid(static_cast<int>(location.offset), static_cast<int>(location.length)),
                       firstFragment(file))
                 << path.toStdString();

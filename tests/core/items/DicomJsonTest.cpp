@@ -2,6 +2,7 @@
 
 #include "kddlib/Limits.h"
 #include "kddlib/net/dicom/DicomFileReader.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "support/DatasetBuilder.h"
@@ -66,7 +67,7 @@ TEST(DicomJson, EqualsThatOfADatasetInUtf8)
     image.with(TagElement(VrCode::UN, "8 bytes.").newDcmElement(DCM_DoubleFloatPixelData).release());
     image.with(TagElement(VrCode::UT, "http://a").newDcmElement(DCM_RetrieveURL).release());
     const std::unique_ptr<TagMap> map(image.map());
-    map->putAndInsertString(DcmTagKey(0x0006, 0x7100), "/never/shown");
+    map->putAndInsertString(kFilePath, "/never/shown");
     EXPECT_EQ(jsonOf(*map), jsonByDcmtk(image.dataset()));
 }
 

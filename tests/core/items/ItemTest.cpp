@@ -2,6 +2,7 @@
 #include "kddlib/items/kdditemtm.h"
 #include "kddlib/net/dicom/DicomFileReader.h"
 #include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "support/DatasetBuilder.h"
@@ -21,9 +22,6 @@ using namespace Kdd;
 
 namespace
 {
-
-const DcmTagKey kFilePath(0x0006, 0x7100);
-const DcmTagKey kTransferSyntax(0x0006, 0x7102);
 
 /// What an item answers, or its condition when that is an error.
 template <typename T, OFCondition (Item::*get)(const DcmTagKey&, T&)>

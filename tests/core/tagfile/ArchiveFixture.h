@@ -7,6 +7,8 @@
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/database/Catalogue.h"
 #include "platform/database/Kxg.h"
+#include "platform/volumefile/OrlanMeshWriter.h"
+#include "platform/volumefile/SOPInstanceUtility.h"
 #include "support/DatasetBuilder.h"
 #include "support/TemporaryStore.h"
 #include "support/TreeText.h"
@@ -21,6 +23,8 @@
 
 namespace Kdd
 {
+
+constexpr int kSize = 32;  // of every picture and slice [pixels]
 
 /// DICOM files, a database that lists them and the tag files that are built from both.
 class ArchiveTest : public testing::Test
@@ -111,6 +115,45 @@ protected:
         int count = -1;
         EXPECT_TRUE(mCatalogue->countWaiting(count).good());
         return count;
+    }
+
+    static QByteArray halfBright()
+    {
+        QByteArray pixels(kSize * kSize, '\0');
+        for (int i = 0; i < pixels.size(); ++i)
+            pixels[i] = i % kSize < kSize / 2 ? '\x10' : '\xf0';
+        return pixels;
+    }
+
+    /// A volume file of the images named, one slice each.
+    void writeVolume(const QByteArray& name, const std::vector<std::string>& sopUIDs,
+                     const QMap<QByteArray, QByteArray>& attributes = {{"G0020-000E", "UI:1.2.3"}})
+    {
+        Result result;
+        const int slices = qMax(1, static_cast<int>(sopUIDs.size()));
+        const Lattice lattice{"Level0", {kSize, kSize, slices}, PrimitiveType::UInt8, 1};
+        const auto writer = OrlanMeshWriter::create(path(name), lattice, result);
+        ASSERT_NE(writer, nullptr) << qPrintable(result.text());
+        const TypedData2D pixels{kSize, kSize, 1, PrimitiveType::UInt8, halfBright()};
+        for (int z = 0; z < slices; ++z)
+            ASSERT_TRUE(writer->writeSlice(z, pixels).good());
+        ParamBundle dicom;
+        for (auto it = attributes.cbegin(); it != attributes.cend(); ++it)
+            dicom.insert(it.key(), Parameter::ofText(it.value()));
+        ParamBundle parameters;
+        parameters.insertBundle("DICOM", dicom);
+        parameters.insertBundle("SOPInstanceUIDs", SOPInstanceUtility::bundleOf(sopUIDs));
+        parameters.insert("BoundingBox", Parameter::ofReals({0, 31, 0, 31, -5, 5}));
+        parameters.insert("PaddingValue", Parameter::ofIntegers({7}));
+        parameters.insert("PaddingRangeMin", Parameter::ofIntegers({1}));
+        parameters.insert("PaddingRangeMax", Parameter::ofIntegers({2}));
+        if (mRange != 0)
+            parameters.insert("DataMinMax", Parameter::ofIntegers({0, mRange}));
+        ASSERT_TRUE(writer->writeParameters(parameters).good());
+        if (mBins != 0) {
+            EXPECT_TRUE(writer->writeDataSection("Histogram", QVector<quint64>(mBins, 1)).good());
+        }
+        ASSERT_TRUE(writer->finish().good());
     }
 
     static QAData edit(const Uids& images, const Substitutions& substitutions, const char* study = "1")
@@ -215,6 +258,8 @@ protected:
     QByteArray mAddress = "sqlite:" + mStore.filePath("catalogue.db").toUtf8();
     std::unique_ptr<Kxg::Catalogue> mCatalogue;
     TagFileGenerator mGenerator;
+    int mBins = 0;   // of the histograms of volume files
+    int mRange = 0;  // their greatest value, if it is told
 };
 
 }  // namespace Kdd

@@ -1,7 +1,5 @@
 #include "ArchiveFixture.h"
 #include "kddlib/volumes/Volume.h"
-#include "platform/volumefile/OrlanMeshWriter.h"
-#include "platform/volumefile/SOPInstanceUtility.h"
 #include "support/LogCapture.h"
 
 namespace Kdd
@@ -18,28 +16,9 @@ protected:
         for (const char* uid : {"a", "b", "c"})
             save(uid, "1");
         save("z", "2");
-        writeVolume({"a", "b", "c"});
+        writeVolume("1.1-stack.vol", {"a", "b", "c"}, {{"G0020-000E", "UI:1.1"}});
         registerFiles({{}, {{path("1.1-stack.vol"), {}, "1", "1.1"}}, {}});
         buildAll();
-    }
-
-    void writeVolume(const std::vector<std::string>& sopUIDs)
-    {
-        Result result;
-        const int slices = static_cast<int>(sopUIDs.size());
-        const auto writer = OrlanMeshWriter::create(
-            path("1.1-stack.vol"), {"Level0", {2, 2, slices}, PrimitiveType::UInt8, 1}, result);
-        ASSERT_NE(writer, nullptr) << qPrintable(result.text());
-        for (int z = 0; z < slices; ++z)
-            ASSERT_TRUE(
-                writer->writeSlice(z, TypedData2D{2, 2, 1, PrimitiveType::UInt8, QByteArray(4, '1')}).good());
-        ParamBundle dicom;
-        dicom.insert("G0020-000E", Parameter::ofText("UI:1.1"));
-        ParamBundle parameters;
-        parameters.insertBundle("DICOM", dicom);
-        parameters.insertBundle("SOPInstanceUIDs", SOPInstanceUtility::bundleOf(sopUIDs));
-        ASSERT_TRUE(writer->writeParameters(parameters).good());
-        ASSERT_TRUE(writer->finish().good());
     }
 
     /// "1.1: a b c (stack)" for every volume; one that is divided has no geometry.

@@ -1,7 +1,6 @@
 #include "ArchiveFixture.h"
+#include "RandomJobs.h"
 #include "support/LogCapture.h"
-
-#include <random>
 
 namespace Kdd
 {
@@ -15,102 +14,50 @@ constexpr int kImages = 12;
 class RebuiltCorrectionsRandom : public ArchiveTest
 {
 protected:
-    int any(int count) { return static_cast<int>(mRandom() % static_cast<unsigned>(count)); }
-
-    QByteArray anyStudy() { return QByteArray::number(1 + any(3)); }
-
-    QAData anyJob()
+    RebuiltCorrectionsRandom()
     {
-        QAData job = edit({}, {}, anyStudy().constData());
-        if (any(2) == 0)
-            job.oldStudyUID = anyStudy();
-        const QByteArray from = job.oldStudyUID.isEmpty() ? job.studyUID : job.oldStudyUID;
-        for (const auto& each : mStudyOf) {
-            // One image stays, for a study that only tag files know of is not built.
-            if (each.second == from && any(2) == 0 && !each.first.startsWith("stays"))
-                job.images.append(each.first);
-        }
-        if (any(2) == 0)
-            job.substitutions.append({DCM_PatientName, QString::number(any(4))});
-        if (any(3) == 0)
-            job.substitutions.append(
-                {DCM_ImageComments, any(2) == 0 ? QStringLiteral("") : QString::number(any(4))});
-        if (any(2) == 0)
-            job.substitutions.append({DCM_SeriesInstanceUID,
-                                      QString::fromLatin1(job.studyUID + '.' + QByteArray::number(any(3)))});
-        if (any(4) == 0 && job.images.size() == 1)
-            job.substitutions.append({DCM_SOPInstanceUID, QString::number(1000 + mNextUid++)});
-        return job;
+        for (int i = 0; i < kImages; ++i)
+            place(QByteArray::number(100 + i), mJobs.anyStudy());
+        // One image stays, for a study that only tag files know of is not built.
+        for (const QByteArray& study : mAll)
+            place("stays" + study, study);
+        buildAll();
     }
 
-    /// Where the images of the job stand then.
-    void expect(const QAData& job)
+    void place(const QByteArray& uid, const QByteArray& study)
     {
-        for (const QByteArray& uid : job.images) {
-            QByteArray now = uid;
-            QByteArray study = mStudyOf[uid];
-            for (const QASubstitution& each : job.substitutions) {
-                if (each.key == DCM_SOPInstanceUID)
-                    now = each.value.toLatin1();
-                if (each.key == DCM_SeriesInstanceUID)
-                    study = job.studyUID;
-            }
-            mStudyOf.erase(uid);
-            mStudyOf[now] = study;
-        }
+        save(uid.constData(), study.constData());
+        mJobs.images()[uid] = {study, study + ".1", 0, {}};
     }
 
-    void check()
-    {
-        for (const char* study : {"1", "2", "3"}) {
-            Uids expected;
-            for (const auto& each : mStudyOf) {
-                if (each.second == study)
-                    expected.append(each.first);
-            }
-            EXPECT_EQ(imagesIn(study), expected) << "study " << study;
-        }
-    }
-
-    std::map<QByteArray, QByteArray> mStudyOf;
-    std::mt19937 mRandom{7};
-    int mNextUid = 0;
+    RandomJobs mJobs{7};
+    const Uids mAll = {"1.1", "1.2", "1.3"};
 };
 
 TEST_F(RebuiltCorrectionsRandom, NoBuildUndoesWhatWasCorrected)
 {
     const LogCapture quiet;
-    const Uids all = {"1", "2", "3"};
-    for (int i = 0; i < kImages; ++i) {
-        const QByteArray uid = QByteArray::number(100 + i);
-        mStudyOf[uid] = anyStudy();
-        save(uid.constData(), mStudyOf[uid].constData());
-    }
-    for (const QByteArray& study : all) {
-        mStudyOf["stays" + study] = study;
-        save(("stays" + study).constData(), study.constData());
-    }
-    buildAll();
     for (int i = 0; i < 60 && !HasFailure(); ++i) {
-        const QAData job = anyJob();
-        const Files before = tagFiles(all);
+        const QAData job = mJobs.next();
+        const Files before = tagFiles(mAll);
         // Some are made while there is no database, some end in the middle.
-        const int accident = any(5);
+        const int accident = mJobs.any(5);
         if (accident == 0)
             Kxg::SetDatabaseServer(QByteArray());
         correct(job);
         Kxg::SetDatabaseServer(mAddress);
-        expect(job);
-        check();
-        const std::string after = shown(all);
+        mJobs.done(job);
+        for (const QByteArray& study : mAll)
+            EXPECT_EQ(imagesIn(study.constData()), mJobs.imagesIn(study)) << "study " << study.constData();
+        const std::string after = shown(mAll);
         if (accident == 1)
-            putBack(all, before);
+            putBack(mAll, before);
         // The study that images came to is built first: the other one cannot know of moves that no database heard of.
         if (accident == 0)
             build(job.studyUID);
         if (accident <= 2)
             buildAll();
-        EXPECT_EQ(shown(all), after) << "job " << i;
+        EXPECT_EQ(shown(mAll), after) << "job " << i;
     }
 }
 

@@ -5,10 +5,8 @@
 #include "kddlib/tagmodel/TagElement.h"
 #include "support/LogCapture.h"
 #include "support/PostgresServer.h"
+#include "support/Process.h"
 
-#include <sys/resource.h>
-
-#include <csignal>
 #include <thread>
 
 namespace Kdd
@@ -57,21 +55,6 @@ TEST_F(RebuiltCorrections, MovesStay)
     expectSurvival(mAll);
     EXPECT_EQ(imagesIn("2"), (Uids{"a", "b", "z"}));
     EXPECT_EQ(imagesIn("3"), Uids{"c2"});
-}
-
-TEST_F(RebuiltCorrections, AChainOfMovesAndEditsEndsWhereItEnded)
-{
-    correct(edit({"a"}, {{DCM_PatientName, QStringLiteral("Roe^R")}}));
-    correct(move({"a"}, "1", "2", {{DCM_SOPInstanceUID, QStringLiteral("a2")}}));
-    expectSurvival(mAll);
-    correct(move({"a2"}, "2", "3", {{DCM_SOPInstanceUID, QStringLiteral("a3")}}));
-    correct(edit({"a3"}, {{DCM_ImageComments, QStringLiteral("end")}}, "3"));
-    expectSurvival(mAll);
-    EXPECT_EQ(imagesIn("3"), Uids{"a3"});
-    EXPECT_EQ(value("3", "a3", DCM_PatientName), "Roe^R");
-    correct(move({"a3"}, "3", "1", {{DCM_SOPInstanceUID, QStringLiteral("a")}}));
-    expectSurvival(mAll);
-    EXPECT_EQ(imagesIn("1"), (Uids{"a", "b", "c"}));
 }
 
 TEST_F(RebuiltCorrections, AMoveOntoAnImageOfTheSameUidTakesItsPlace)
@@ -162,16 +145,13 @@ TEST_F(RebuiltCorrections, WhatCannotBeWrittenIsNotKeptEither)
     buildAll();
     correct(edit({"b"}, {{DCM_PatientName, QStringLiteral("Roe^R")}}));
     const std::string before = shown(mAll);
-    std::signal(SIGXFSZ, SIG_IGN);
-    rlimit former = {};
-    ::getrlimit(RLIMIT_FSIZE, &former);
-    const rlimit limit = {2000000, former.rlim_max};
-    ::setrlimit(RLIMIT_FSIZE, &limit);
-    EXPECT_NE(refusal(edit({"a", "b"}, {{DCM_PatientName, QStringLiteral("Poe^P")}})), "");
-    EXPECT_NE(refusal(move({"a", "b"}, "1", "3", {{DCM_SOPInstanceUID, QStringLiteral("x")}})), "")
-        << "two of one UID";
-    EXPECT_NE(refusal(move({"a", "b"}, "1", "3")), "");
-    ::setrlimit(RLIMIT_FSIZE, &former);
+    {
+        const FullDisk disk(2000000);
+        EXPECT_NE(refusal(edit({"a", "b"}, {{DCM_PatientName, QStringLiteral("Poe^P")}})), "");
+        EXPECT_NE(refusal(move({"a", "b"}, "1", "3", {{DCM_SOPInstanceUID, QStringLiteral("x")}})), "")
+            << "two of one UID";
+        EXPECT_NE(refusal(move({"a", "b"}, "1", "3")), "");
+    }
     EXPECT_EQ(shown(mAll), before);
     EXPECT_EQ(waiting(), 0);
     EXPECT_EQ(studies(), (Uids{"1", "2"}));
@@ -204,27 +184,6 @@ TEST_F(RebuiltCorrections, WhatWaitedBeforeGoesOnWaiting)
     EXPECT_EQ(waiting(), 1);
     buildAll();
     EXPECT_EQ(imagesIn("1"), Uids{"d"});
-}
-
-TEST_F(RebuiltCorrections, ThoseThatOnlyTheTagFileTellsOfAreAdopted)
-{
-    Kxg::SetDatabaseServer(QByteArray());
-    correct(edit({"a"}, {{DCM_PatientName, QStringLiteral("Roe^R")}}));
-    correct(edit({"b"}, {{DCM_SOPInstanceUID, QStringLiteral("b2")}}));
-    correct(move({"c"}, "1", "2", {{DCM_SOPInstanceUID, QStringLiteral("c2")}}));
-    Kxg::SetDatabaseServer(mAddress);
-    const std::string before = shown(mAll);
-    build("2");
-    build("1");
-    EXPECT_EQ(shown(mAll), before);
-    EXPECT_EQ(waiting(), 0);
-    correct(edit({"a"}, {{DCM_ImageComments, QStringLiteral("next")}}));
-    expectSurvival(mAll);
-    Kxg::SetDatabaseServer(QByteArray());
-    correct(edit({"a"}, {{DCM_PatientID, QStringLiteral("17")}}));
-    Kxg::SetDatabaseServer(mAddress);
-    expectSurvival(mAll);
-    EXPECT_EQ(value("1", "a", DCM_ImageComments), "next");
 }
 
 TEST_F(RebuiltCorrections, AJobOnWhatIsNotAdoptedYetKeepsAllOfIt)

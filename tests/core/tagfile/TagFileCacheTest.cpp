@@ -1,11 +1,7 @@
 #include "TagFileFixture.h"
 #include "platform/base/LogFile.h"
+#include "support/Process.h"
 
-#include <sys/resource.h>
-#include <sys/wait.h>
-#include <unistd.h>
-
-#include <csignal>
 #include <filesystem>
 #include <functional>
 #include <future>
@@ -16,25 +12,6 @@ namespace
 {
 
 const char* const kStudy = "1.2";
-
-/// Whether `life` is true in a process of its own; the signal, negative, when that ended it.
-int inChild(const std::function<bool()>& life)
-{
-    int status = 0;
-    const pid_t pid = ::fork();
-    if (pid == 0)
-        ::_exit(life() ? 1 : 0);
-    ::waitpid(pid, &status, 0);
-    return WIFEXITED(status) ? WEXITSTATUS(status) : -WTERMSIG(status);
-}
-
-/// From now on no file of this process can grow beyond `size`: a write fails, or by the default action ends it.
-void fillDisk(qint64 size, sighandler_t action)
-{
-    ::signal(SIGXFSZ, action);
-    const rlimit limit = {static_cast<rlim_t>(size), static_cast<rlim_t>(size)};
-    ::setrlimit(RLIMIT_FSIZE, &limit);
-}
 
 bool write(TagFile& file)
 {
@@ -246,7 +223,7 @@ TEST_F(TagFileCache, AFullDiskLeavesTheOldFileWhole)
                           if (keepOpen && !file.readCacheFileForStudy(kStudy, true))
                               return false;
                           fill(file, 1, 9);
-                          fillDisk(before.size() + 50, SIG_IGN);
+                          const FullDisk disk(before.size() + 50);
                           return !how(file) && !file.failure().isEmpty() && log.count(named("")) == 1 &&
                                  file.imagesByUID().size() == 9;
                       }),
@@ -262,27 +239,12 @@ TEST_F(TagFileCache, AFullDiskLeavesNoNewFile)
     const LogCapture log;
     for (const auto how : {write, merge}) {
         EXPECT_EQ(inChild([&] {
-                      fillDisk(100, SIG_IGN);
+                      const FullDisk disk(100);
                       return !put(1, 3, how);
                   }),
                   1);
         EXPECT_FALSE(QFile::exists(path()) || QFile::exists(journal()));
     }
-}
-
-TEST_F(TagFileCache, AWriterThatDiesWhileItPreparesHasChangedNothing)
-{
-    ASSERT_TRUE(put(1, 4, write));
-    const QByteArray before = content();
-    EXPECT_EQ(inChild([&] {
-                  fillDisk(before.size() + 50, SIG_DFL);
-                  return put(1, 9, merge);
-              }),
-              -SIGXFSZ);
-    EXPECT_TRUE(QFile::exists(journal()));
-    EXPECT_EQ(imagesFound(), 4);
-    EXPECT_EQ(content(), before);
-    EXPECT_FALSE(QFile::exists(journal()));
 }
 
 /// What a writer of images 1 to 9 left when it died after it had written so much of them over images 1 to 4.
@@ -302,53 +264,39 @@ const Death kDeaths[] = {
     {"WhenTheJournalHadJustBegun", 0, 100000, 4},
 };
 
-class DeadWriter : public TagFileCache, public testing::WithParamInterface<Death>
+TEST_F(TagFileCache, WhatADeadWriterLeftIsFinishedByWhoeverOpensTheFileNext)
 {
-protected:
-    void SetUp() override
-    {
-        ASSERT_TRUE(put(1, 9, write));
-        const QByteArray wanted = content();
-        ASSERT_TRUE(put(1, 4, write));
-        const int done = wanted.size() * GetParam().writtenPercent / 100;
+    const std::function<int()> openers[] = {
+        [] { return imagesFound(); },
+        [] {
+            TagFile file;
+            return file.readCacheFileForStudy(kStudy, true) ? file.imagesByUID().size() : -1;
+        },
+        [] { return put(10, 10, merge) ? imagesFound() - 1 : -1; },
+    };
+    ASSERT_TRUE(put(1, 9, write));
+    const QByteArray wanted = content();
+    ASSERT_TRUE(put(1, 4, write));
+    const QByteArray former = content();
+    const auto die = [&](const Death& death, const QByteArray& before) {
+        const int done = wanted.size() * death.writtenPercent / 100;
+        put(path(), wanted.left(done) + before.mid(done));
         QByteArray left = journalOf(wanted);
-        left.chop(GetParam().journalCut);
-        put(path(), wanted.left(done) + content().mid(done));
+        left.chop(death.journalCut);
         put(journal(), left);
+    };
+    for (const Death& death : kDeaths) {
+        for (const auto& images : openers) {
+            die(death, former);
+            EXPECT_EQ(images(), death.images) << death.name;
+            EXPECT_FALSE(QFile::exists(journal())) << death.name;
+        }
+        die(death, "");
+        EXPECT_TRUE(put(10, 10, merge));
+        EXPECT_EQ(imagesFound(), death.images == 9 ? 10 : 1) << death.name << " of a new file";
+        EXPECT_FALSE(QFile::exists(journal())) << death.name;
     }
-
-    void TearDown() override { EXPECT_FALSE(QFile::exists(journal())); }
-};
-
-TEST_P(DeadWriter, IsFinishedByTheNextReader)
-{
-    EXPECT_EQ(imagesFound(), GetParam().images);
-    EXPECT_FALSE(QFile::exists(journal()));
-    EXPECT_EQ(imagesFound(), GetParam().images);
 }
-
-TEST_P(DeadWriter, IsFinishedByWhoeverKeepsTheFileOpen)
-{
-    TagFile file;
-    ASSERT_TRUE(file.readCacheFileForStudy(kStudy, true));
-    EXPECT_EQ(file.imagesByUID().size(), GetParam().images);
-}
-
-TEST_P(DeadWriter, IsFinishedByTheNextMerge)
-{
-    EXPECT_TRUE(put(10, 10, merge));
-    EXPECT_EQ(imagesFound(), GetParam().images + 1);
-}
-
-TEST_P(DeadWriter, OfANewFileIsFinishedToo)
-{
-    put(path(), "");
-    EXPECT_TRUE(put(10, 10, merge));
-    EXPECT_EQ(imagesFound(), GetParam().journalCut == 0 ? 10 : 1);
-}
-
-INSTANTIATE_TEST_SUITE_P(Deaths, DeadWriter, testing::ValuesIn(kDeaths),
-                         [](const auto& row) { return std::string(row.param.name); });
 
 TEST_F(TagFileCache, TheBytesOfAFolderNameSurvive)
 {

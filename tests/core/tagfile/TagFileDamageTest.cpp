@@ -5,12 +5,16 @@
 #include "platform/compression/QxCompress.h"
 
 #include <dcmtk/dcmdata/dcdeftag.h>
+#include <lzma.h>
 #include <sys/resource.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cstdio>
 #include <new>
+#include <random>
+#include <vector>
 
 using namespace Kdd;
 
@@ -116,6 +120,33 @@ const Body kBodies[] = {
     {"TwoStudies", kBelow + image("1") + study({}, "1.3") + series("t") + image("2", "x"), 1},
     {"OneKeyTwice", kBelow + image("1", nested(3) + nested(3) + kText + length(0)), 1},
 };
+
+QByteArray noise(int size)
+{
+    std::mt19937 random;
+    QByteArray bytes(size, Qt::Uninitialized);
+    std::generate(bytes.begin(), bytes.end(), [&] { return static_cast<char>(random()); });
+    return bytes;
+}
+
+/// The container with another index and footer, which tell what its content would unfold to.
+QByteArray announcing(qint64 size, const QByteArray& xz)
+{
+    lzma_stream_flags flags = {};
+    const auto* footer = reinterpret_cast<const quint8*>(xz.constEnd()) - LZMA_STREAM_HEADER_SIZE;
+    EXPECT_EQ(lzma_stream_footer_decode(&flags, footer), LZMA_OK);
+    QByteArray lie = xz.chopped(LZMA_STREAM_HEADER_SIZE + static_cast<int>(flags.backward_size));
+    lzma_index* index = lzma_index_init(nullptr);
+    const auto block = static_cast<lzma_vli>(lie.size() - LZMA_STREAM_HEADER_SIZE);
+    EXPECT_EQ(lzma_index_append(index, nullptr, block, static_cast<lzma_vli>(size)), LZMA_OK);
+    flags.backward_size = lzma_index_size(index);
+    std::size_t written = 0;
+    std::vector<quint8> end(flags.backward_size + LZMA_STREAM_HEADER_SIZE);
+    EXPECT_EQ(lzma_index_buffer_encode(index, end.data(), &written, end.size()), LZMA_OK);
+    EXPECT_EQ(lzma_stream_footer_encode(&flags, end.data() + written), LZMA_OK);
+    lzma_index_end(index, nullptr);
+    return lie.append(reinterpret_cast<const char*>(end.data()), static_cast<int>(end.size()));
+}
 
 class TagFileDamage : public TagFileTest
 {
@@ -243,15 +274,16 @@ TEST_F(TagFileDamage, CompressedBodiesThatAnnounceTooMuchAreRefused)
     for (const char* hex : {"ffffffff", "7fffffff", "10000001", "00000000"})
         EXPECT_EQ(imagesReadInSmallMemory(framed(QByteArray::fromHex(hex) + zlib.mid(4), Mode::Zlib)),
                   kRefused);
-    const QByteArray bomb = lzmaCompress(QByteArray(static_cast<int>(kMaxBodySize) + 1, '\0'));
-    ASSERT_FALSE(bomb.isEmpty());
+    const QByteArray bomb = announcing(kMaxBodySize + 1, lzmaCompress(noise(100000)));
     EXPECT_EQ(imagesReadInSmallMemory(framed(bomb, Mode::Lzma)), kRefused);
 }
 
 TEST_F(TagFileDamage, MoreElementsOrItemsThanAnyStudyHasAreRefused)
 {
+#ifndef __SANITIZE_ADDRESS__  // which takes a minute for so many small pieces of memory
     const QByteArray markers = head(DCM_PatientID, VrCode::Missing).repeated(kMaxElements + 1);
-    EXPECT_EQ(imagesRead(zlibFramed(study(markers))), kRefused);
+    EXPECT_EQ(imagesRead(framed(study(markers))), kRefused);
+#endif
     const QByteArray items = sequence(length(kMaxElements + 1), length(0).repeated(kMaxElements + 1));
     EXPECT_EQ(imagesReadInSmallMemory(framed(study(items))), kRefused);
 }

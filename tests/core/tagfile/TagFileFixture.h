@@ -1,8 +1,11 @@
 #pragma once
 
 #include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
+#include "kddlib/volumes/Volume.h"
+#include "kddlib/volumes/VolumeInfo.h"
 #include "support/DatasetBuilder.h"
 #include "support/FileContent.h"
 #include "support/LogCapture.h"
@@ -27,8 +30,6 @@ using Uids = QList<QByteArray>;
 
 constexpr Mode kModes[] = {Mode::None, Mode::Zlib, Mode::Lzma};
 constexpr int kHeaderSize = 12;  // of a file, with the size of its body
-const DcmTagKey kFilePath(0x0006, 0x7100);
-const DcmTagKey kPreview(0x0006, 0x7105);
 
 /// A store of its own and the words in which tests speak of tag files.
 class TagFileTest : public testing::Test
@@ -76,6 +77,25 @@ protected:
     {
         QDataStream in(content);
         return file.readCacheFile(in, studyUID);
+    }
+
+    /// What the file of a volume says, one slice for each image. The name tells volumes and their previews apart.
+    static VolumeInfo aVolume(const std::vector<std::string>& imageUIDs, const char* name)
+    {
+        VolumeInfo info;
+        info.imageUIDs = imageUIDs;
+        info.name = info.preview = name;
+        info.dims = {4, 4, static_cast<int>(imageUIDs.size())};
+        info.histogram = KxHistogram({3, 4}, 0, 100);
+        return info;
+    }
+
+    static void addVolumes(TagFile& file, std::vector<VolumeInfo> infos)
+    {
+        std::vector<VolumeInfo*> pointers;
+        for (VolumeInfo& each : infos)
+            pointers.push_back(&each);
+        file.addVolumeInfo(pointers);
     }
 
     /// The file of the study that images belong to by default.

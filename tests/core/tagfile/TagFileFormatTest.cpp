@@ -1,8 +1,6 @@
 #include "TagFileFixture.h"
 #include "kddlib/Limits.h"
 #include "kddlib/tagmodel/TagSequence.h"
-#include "kddlib/volumes/Volume.h"
-#include "kddlib/volumes/VolumeInfo.h"
 #include "platform/base/KxMsg.h"
 
 using namespace Kdd;
@@ -10,7 +8,6 @@ using namespace Kdd;
 namespace
 {
 
-const DcmTagKey kPreviewIndex(0x0006, 0x7106);
 const QByteArray kPreviewElement = QByteArray::fromHex("06000671090100");  // up to its value of one character
 
 class TagFileFormat : public TagFileTest
@@ -61,13 +58,20 @@ protected:
 TEST_F(TagFileFormat, IsFixedToTheByte)
 {
     TagFile file;
-    add(file, anImage("1.2.3.1").without(DCM_SOPClassUID));
-    const QByteArray expected = QByteArray::fromHex("54614361 00 00 02 00"
-                                                    "0000002d"
-                                                    "00 0a00 20000d00 16 0300 312e32"
-                                                    "01 0c00 20000e00 16 0500 312e322e33"
-                                                    "02 0e00 08001800 16 0700 312e322e332e31"
-                                                    "00000000");
+    TagMap* image = add(file, anImage("1.2.3.1").without(DCM_SOPClassUID));
+    for (const DcmTagKey& key : {kFilePath, kFileSuffix, kTransferSyntax, kVolumeIndex})
+        image->putAndInsertInt(key, 0);
+    for (const DcmTagKey& key : {kFromDatabase, kHasVolumeFile, kAbstract})
+        file.study()->putAndInsertInt(key, 1);
+    const QByteArray expected =
+        QByteArray::fromHex("54614361 00 00 02 00"
+                            "00000065"
+                            "00 2200 06000771 0c 0100 01 06000871 0c 0100 01 06002071 0c 0100 01"
+                            "20000d00 16 0300 312e32"
+                            "01 0c00 20000e00 16 0500 312e322e33"
+                            "02 2e00 06000071 0c 0100 00 06000171 0c 0100 00 06000271 0c 0100 00"
+                            "06000371 0c 0100 00 08001800 16 0700 312e322e332e31"
+                            "00000000");
     EXPECT_EQ(written(file).toHex(), expected.toHex());
 }
 
@@ -83,19 +87,10 @@ TEST_F(TagFileFormat, EveryCompressionIsReadWhateverIsSet)
             TagFile again;
             ASSERT_TRUE(read(again, content));
             EXPECT_EQ(treeText(again), treeText(file));
+            EXPECT_EQ(again.findSeries("1.2.3")->volumes().at(0)->previewData(), "the volume's jpeg");
+            EXPECT_EQ(written(again, mode).toHex(), content.toHex());
         }
     }
-}
-
-TEST_F(TagFileFormat, WhatWasReadIsWrittenAsItWas)
-{
-    TagFile file;
-    fill(file);
-    TagFile again;
-    ASSERT_TRUE(read(again, written(file)));
-    EXPECT_EQ(imagesText(again), imagesText(file));
-    EXPECT_EQ(again.findSeries("1.2.3")->volumes().at(0)->previewData(), "the volume's jpeg");
-    EXPECT_EQ(written(again).toHex(), written(file).toHex());
 }
 
 TEST_F(TagFileFormat, TheOldLayoutRunsToTheEndAndHasNoPreviews)
@@ -157,18 +152,6 @@ TEST_F(TagFileFormat, LengthsFrom65535OnTakeSixBytes)
     }
 }
 
-TEST_F(TagFileFormat, ValuesAndRecordsAroundTheLongLengthComeBack)
-{
-    // The record is longer than the value by the UID and the two heads.
-    for (int length = 65500; length <= 65540; ++length) {
-        TagFile file;
-        add(file, anImage("1"))->putAndInsertValue(DCM_PixelData, VrCode::OB, QByteArray(length, 'x'));
-        TagFile again;
-        ASSERT_TRUE(read(again, written(file)));
-        EXPECT_EQ(imagesText(again), imagesText(file));
-    }
-}
-
 TEST_F(TagFileFormat, OnlyTheStudyAskedForIsRead)
 {
     TagFile one;
@@ -227,37 +210,30 @@ void nest(TagFile& file, int depth)
                                     outermost->findElement(DCM_RequestAttributesSequence)->clone());
 }
 
-/// As many volumes as an image can name, each of all images.
-void addVolumes(TagFile& file, int images)
+/// More items and values than the format allows, which share their values, so that few are in memory.
+void addTooMany(TagFile& file)
 {
-    constexpr int kVolumes = 256;
-    TagMap& series = *file.findSeries("1.2.3");
-    for (int i = series.children().size(); i < images; ++i)
-        file.addTagMap(anImage(QByteArray::number(1000 + i).constData()).map(), nullptr, false);
-    VolumeInfo info;
-    for (const QByteArray& uid : file.imagesByUID().keys())
-        info.imageUIDs.push_back(uid.toStdString());
-    file.addVolumeInfo(std::vector<VolumeInfo*>(kVolumes, &info));
+    constexpr int kValues = 4000;
+    auto* first = new TagMap;
+    for (int i = 0; i < kValues; ++i)
+        first->markAsMissing({0x0009, static_cast<Uint16>(0x1000 + i)});
+    auto* sequence = new TagSequence;
+    sequence->addItem(first);
+    for (int i = 0; i < kMaxElements / kValues; ++i)
+        sequence->addItem(new TagMap(*first));
+    file.study()->putElement(DCM_RequestAttributesSequence, sequence);
 }
 
 const Unreadable kUnreadable[] = {
     {"Tag file would nest sequence items deeper than the format allows",
      [](TagFile& file) { nest(file, kMaxItemDepth + 1); }},
-    {"Tag file would hold more nodes, items and values than the format allows",
-     [](TagFile& file) {
-         auto* sequence = new TagSequence;
-         for (int i = 0; i < kMaxElements; ++i)
-             sequence->addItem(nullptr);
-         file.study()->putElement(DCM_RequestAttributesSequence, sequence);
-     }},
+    {"Tag file would hold more nodes, items and values than the format allows", addTooMany},
     {"Tag file would be larger than the format allows",
      [](TagFile& file) {
          const QByteArray half(static_cast<int>(kMaxBodySize / 2), 'x');
          file.findImage("1")->putAndInsertValue(DCM_PixelData, VrCode::OB, half);
          file.findImage("2")->putAndInsertValue(DCM_PixelData, VrCode::OB, half);
      }},
-    {"the images of series 1.2.3 cannot tell its 256 volumes apart",
-     [](TagFile& file) { addVolumes(file, kMaxVolumeImages / 256 + 1); }},
     {"Tag file would hold image 1 twice",
      [](TagFile& file) { file.findImage("2")->putAndInsertString(DCM_SOPInstanceUID, "1"); }},
     {"Tag file would hold image without UID twice",
@@ -286,28 +262,17 @@ TEST_F(TagFileFormat, IsNotWrittenWithWhatItsReaderWouldRefuse)
         const LogCapture log;
         EXPECT_FALSE(file.writeCacheFile());
         EXPECT_EQ(file.failure(), QLatin1String(row.reason));
-        QByteArray streamed;
-        QDataStream out(&streamed, QIODevice::WriteOnly);
-        EXPECT_FALSE(file.writeCacheFile(out));
-        EXPECT_EQ(log.count(row.reason), 2);
-        EXPECT_TRUE(streamed.isEmpty());
+        EXPECT_EQ(log.count(row.reason), 1);
         EXPECT_EQ(content(), before);
+        if (&row == &kUnreadable[0]) {
+            QByteArray streamed;
+            QDataStream out(&streamed, QIODevice::WriteOnly);
+            EXPECT_FALSE(file.writeCacheFile(out) || file.mergeIntoCacheFile());
+            EXPECT_EQ(log.count(row.reason), 3);
+            EXPECT_TRUE(streamed.isEmpty());
+            EXPECT_EQ(content(), before);
+        }
     }
-}
-
-TEST_F(TagFileFormat, AMergeThatItsReaderWouldRefuseLeavesTheFile)
-{
-    TagFile held;
-    add(held, anImage("1"));
-    ASSERT_TRUE(held.writeCacheFile());
-    const QByteArray before = content();
-    TagFile fresh;
-    add(fresh, anImage("2"));
-    nest(fresh, kMaxItemDepth + 1);
-    const LogCapture log;
-    EXPECT_FALSE(fresh.mergeIntoCacheFile());
-    EXPECT_EQ(log.count(kUnreadable[0].reason), 1);
-    EXPECT_EQ(content(), before);
 }
 
 TEST_F(TagFileFormat, WhatItsReaderJustTakesIsWritten)
@@ -316,7 +281,6 @@ TEST_F(TagFileFormat, WhatItsReaderJustTakesIsWritten)
     add(file, anImage("1"));
     add(file, anImage("2"));
     nest(file, kMaxItemDepth);
-    addVolumes(file, kMaxVolumeImages / 256);
     TagFile again;
     ASSERT_TRUE(read(again, written(file)));
     EXPECT_EQ(treeText(again), treeText(file));

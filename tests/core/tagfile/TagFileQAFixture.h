@@ -3,8 +3,6 @@
 #include "TagFileFixture.h"
 #include "kddlib/tagfile/qa/QAAudit.h"
 #include "kddlib/tagfile/qa/QAData.h"
-#include "kddlib/volumes/Volume.h"
-#include "kddlib/volumes/VolumeInfo.h"
 
 namespace Kdd
 {
@@ -87,22 +85,10 @@ protected:
     {
         const std::unique_ptr<TagMap> copy(image.clone());
         for (const DcmTagKey& key :
-             {DCM_StudyInstanceUID, DCM_SeriesInstanceUID, DcmTagKey(0x0006, 0x7103),
-              DcmTagKey(0x0006, 0x7105), DcmTagKey(0x0006, 0x7107), DcmTagKey(0x0006, 0x7120),
+             {DCM_StudyInstanceUID, DCM_SeriesInstanceUID, kVolumeIndex, kPreview, kFromDatabase, kAbstract,
               DcmTagKey(0x0071, 0x0010), DcmTagKey(0x0071, 0x1021), DcmTagKey(0x0071, 0x1022)})
             copy->deleteElement(key);
         return shownText(*copy);
-    }
-
-    static VolumeInfo volume(const std::vector<std::string>& imageUIDs, const char* name)
-    {
-        VolumeInfo info;
-        info.imageUIDs = imageUIDs;
-        info.name = name;
-        info.dims = {4, 4, static_cast<int>(imageUIDs.size())};
-        info.preview = name;
-        info.histogram = KxHistogram({3, 4}, 0, 100);
-        return info;
     }
 
     /// "1 2 3, 5 4": the slices of the volumes of a series, which must be what its images say of themselves.

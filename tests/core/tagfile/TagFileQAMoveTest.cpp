@@ -1,8 +1,6 @@
 #include "TagFileQAFixture.h"
+#include "support/Process.h"
 
-#include <sys/resource.h>
-
-#include <csignal>
 #include <thread>
 
 namespace Kdd
@@ -25,11 +23,9 @@ protected:
                     .with(DCM_ImageComments, "only of " + number)
                     .withItem(DCM_ReferencedStudySequence, anItem().with(DCM_PatientID, number.constData())));
         }
-        VolumeInfo first = volume({"1", "2", "3", "4"}, "x-first.vol");
-        VolumeInfo second = volume({"6", "5"}, "x-second.vol");
-        file.addVolumeInfo({&first, &second});
+        addVolumes(file, {aVolume({"1", "2", "3", "4"}, "x-first.vol"), aVolume({"6", "5"}, "x-second.vol")});
         file.createAbstractTags();
-        file.study()->putAndInsertInt({0x0006, 0x7107}, 1);
+        file.study()->putAndInsertInt(kFromDatabase, 1);
         file.optimizeAll();
         EXPECT_TRUE(file.writeCacheFile());
         TagFile other;
@@ -53,7 +49,7 @@ TEST_F(TagFileQAMove, TakesImagesWithAllTheyShowToTheOtherStudy)
     EXPECT_EQ(kept(*stored("1.2")->findImage("2")), second);
     EXPECT_EQ(shown("1.9", "1", DCM_StudyInstanceUID), "1.9");
     EXPECT_EQ(shown("1.9", "1", DCM_SeriesInstanceUID), "1.9.2");
-    EXPECT_EQ(shown("1.9", "1", {0x0006, 0x7120}), "none") << "what the old series said of itself";
+    EXPECT_EQ(shown("1.9", "1", kAbstract), "none") << "what the old series said of itself";
     EXPECT_EQ(logOf(*stored("1.9")->findImage("1")).text(),
               "31/1/2024 12:00:00 PM anna\n0020-000e\n1.2.3\n1.9.2\n0020-000d\n1.2\n1.9\n\n");
     EXPECT_EQ(treeText(*stored("1.2")).find("only of 1"), std::string::npos)
@@ -94,9 +90,8 @@ TEST_F(TagFileQAMove, InsideOfAStudyDividesThemToo)
     EXPECT_EQ(volumesOf(*file, "1.2.3"), "3 4, 5");
     EXPECT_EQ(volumesOf(*file, "1.2.4"), "1 2, 6");
     EXPECT_EQ(shown(*file->findImage("1"), DCM_SeriesInstanceUID), "1.2.4");
-    EXPECT_EQ(shown(*file->findImage("6"), {0x0006, 0x7107}), "01") << "what the study says of itself";
-    EXPECT_EQ(shown(*file->findImage("6"), {0x0006, 0x7120}) + ", " +
-                  shown(*file->findImage("3"), {0x0006, 0x7120}),
+    EXPECT_EQ(shown(*file->findImage("6"), kFromDatabase), "01") << "what the study says of itself";
+    EXPECT_EQ(shown(*file->findImage("6"), kAbstract) + ", " + shown(*file->findImage("3"), kAbstract),
               "Series (2), Series (1)")
         << "labels tell series apart";
 }
@@ -133,8 +128,7 @@ TEST_F(TagFileQAMove, ReplacesAnImageOfTheSameUid)
     add(other, anImage("1").inStudy("1.9").inSeries("1.9.1").with(DCM_PatientName, "Other"));
     ASSERT_TRUE(other.mergeIntoCacheFile());
     ASSERT_TRUE(other.readCacheFileForStudy("1.9", true));
-    VolumeInfo both = volume({"9", "1"}, "x-both.vol");
-    other.addVolumeInfo({&both});
+    addVolumes(other, {aVolume({"9", "1"}, "x-both.vol")});
     ASSERT_TRUE(other.writeCacheFile());
     EXPECT_TRUE(apply(move({"1"}, "1.9.1")));
     EXPECT_EQ(log.count("Image 1 of study 1.2 replaces the one that study 1.9 had"), 1);
@@ -142,25 +136,6 @@ TEST_F(TagFileQAMove, ReplacesAnImageOfTheSameUid)
     EXPECT_EQ(stored("1.9")->imagesByUID().size(), 2);
     EXPECT_EQ(volumesOf(*stored("1.9"), "1.9.1"), "9 1, 1");
 }
-
-/// Like a disk that is full when the larger one of two files is to be written.
-class SmallFilesOnly
-{
-public:
-    explicit SmallFilesOnly(rlim_t bytes)
-    {
-        std::signal(SIGXFSZ, SIG_IGN);
-        ::getrlimit(RLIMIT_FSIZE, &mFormer);
-        const rlimit limit = {bytes, mFormer.rlim_max};
-        ::setrlimit(RLIMIT_FSIZE, &limit);
-    }
-    ~SmallFilesOnly() { ::setrlimit(RLIMIT_FSIZE, &mFormer); }
-    SmallFilesOnly(const SmallFilesOnly&) = delete;
-    SmallFilesOnly& operator=(const SmallFilesOnly&) = delete;
-
-private:
-    rlimit mFormer = {};
-};
 
 TEST_F(TagFileQAMove, ThatCannotBeWrittenLeavesBothStudiesAsTheyWere)
 {
@@ -174,7 +149,7 @@ TEST_F(TagFileQAMove, ThatCannotBeWrittenLeavesBothStudiesAsTheyWere)
         for (const QByteArray& image : {QByteArray("1"), QByteArray("2")}) {
             const QByteArray before[] = {content(), content(pathOf(destination))};
             {
-                const SmallFilesOnly limit(500000);
+                const FullDisk forTheLargerFile(500000);
                 EXPECT_NE(refusal(move({image}, "1.9.2", destination)), "");
             }
             EXPECT_EQ(content(), before[0]);

@@ -21,17 +21,6 @@ struct Fault
     const char* message;
 };
 
-void PrintTo(const Fault& fault, std::ostream* out)
-{
-    *out << fault.name;
-}
-
-template <typename T>
-std::string nameOf(const testing::TestParamInfo<T>& info)
-{
-    return info.param.name;
-}
-
 // ---- the XML of a job
 
 TEST(QAJobXml, IsReadByTheNamesOfItsElements)
@@ -72,20 +61,6 @@ TEST(QAJobXml, TimeAndLoginMayBeIndentedAndTheTimeHaveAFraction)
     EXPECT_TRUE(job.parse("<Timestamp> </Timestamp>", message)) << "now";
 }
 
-class QAJobFault : public testing::TestWithParam<Fault>
-{
-};
-
-TEST_P(QAJobFault, IsNamedAndLeavesTheJobAlone)
-{
-    QAData job;
-    job.login = "before";
-    QString message;
-    EXPECT_FALSE(job.parse(GetParam().text, message));
-    EXPECT_THAT(message.toStdString(), testing::HasSubstr(GetParam().message));
-    EXPECT_EQ(job.login, "before");
-}
-
 const Fault kJobFaults[] = {
     {"Empty", "", "Line 1"},
     {"Unclosed", "<a>\n<b>", "Line 2"},
@@ -111,7 +86,18 @@ const Fault kJobFaults[] = {
     {"Entities", "<!DOCTYPE a [<!ENTITY b 'bbbb'><!ENTITY c '&b;&b;'>]><Login>&c;</Login>", "document type"},
     {"TooLong", QByteArray(kMaxJobXml + 1, ' '), "longer than 1048576"},
 };
-INSTANTIATE_TEST_SUITE_P(Table, QAJobFault, testing::ValuesIn(kJobFaults), nameOf<Fault>);
+
+TEST(QAJobXml, AFaultIsNamedAndLeavesTheJobAlone)
+{
+    for (const Fault& fault : kJobFaults) {
+        QAData job;
+        job.login = "before";
+        QString message;
+        EXPECT_FALSE(job.parse(fault.text, message)) << fault.name;
+        EXPECT_THAT(message.toStdString(), testing::HasSubstr(fault.message)) << fault.name;
+        EXPECT_EQ(job.login, "before") << fault.name;
+    }
+}
 
 // ---- texts
 
@@ -122,24 +108,6 @@ struct WrittenText
     const char* text;
     const char* bytes;  // null when it cannot be written
 };
-
-void PrintTo(const WrittenText& written, std::ostream* out)
-{
-    *out << written.name;
-}
-
-class TextOfCharacterSet : public testing::TestWithParam<WrittenText>
-{
-};
-
-TEST_P(TextOfCharacterSet, IsReadBackOrRefused)
-{
-    const QString text = QString::fromUtf8(GetParam().text);
-    QByteArray bytes = "before";
-    EXPECT_EQ(encodeText(text, GetParam().characterSet, bytes), GetParam().bytes != nullptr);
-    EXPECT_EQ(bytes.toPercentEncoding(),
-              QByteArray(GetParam().bytes != nullptr ? GetParam().bytes : "before").toPercentEncoding());
-}
 
 const WrittenText kTexts[] = {
     {"Undeclared", "", "M\xc3\xbcller", "M\xfcller"},
@@ -156,7 +124,17 @@ const WrittenText kTexts[] = {
     {"UnknownSet", "ISO_IR 999", "\xc3\xbc", nullptr},
     {"AsciiInUnknownSet", "ISO_IR 999", "a", "a"},
 };
-INSTANTIATE_TEST_SUITE_P(Table, TextOfCharacterSet, testing::ValuesIn(kTexts), nameOf<WrittenText>);
+
+TEST(TextOfCharacterSet, IsWrittenOrRefused)
+{
+    for (const WrittenText& row : kTexts) {
+        QByteArray bytes = "before";
+        EXPECT_EQ(encodeText(QString::fromUtf8(row.text), row.characterSet, bytes), row.bytes != nullptr);
+        EXPECT_EQ(bytes.toPercentEncoding(),
+                  QByteArray(row.bytes != nullptr ? row.bytes : "before").toPercentEncoding())
+            << row.name;
+    }
+}
 
 TEST(AuditLogText, KeepsLinesInsideOfTexts)
 {
@@ -253,23 +231,6 @@ struct Refused
     const char* reason;
 };
 
-void PrintTo(const Refused& refused, std::ostream* out)
-{
-    *out << refused.name;
-}
-
-class RefusedEdit : public TagFileQAEdit, public testing::WithParamInterface<Refused>
-{
-};
-
-TEST_P(RefusedEdit, ChangesNoImageAtAll)
-{
-    const QByteArray before = content();
-    const QAData job = edit({"1", "3", "2"}, {{DCM_PatientName, text("Roe")}, GetParam().substitution});
-    EXPECT_THAT(refusal(job), testing::HasSubstr(GetParam().reason));
-    EXPECT_EQ(content(), before);
-}
-
 const Refused kRefused[] = {
     {"NoNumber", {DCM_Rows, QStringLiteral("eight")}, "\"eight\" is no number of VR US"},
     {"TooLargeANumber", {DCM_Rows, QStringLiteral("70000")}, "\"70000\" is no number"},
@@ -304,7 +265,16 @@ const Refused kRefused[] = {
     {"OwnAttribute", {DcmTagKey(0x0006, 0x7100), QStringLiteral("/x")}, "no attribute of an image"},
     {"PrivateCreator", {DcmTagKey(0x0071, 0x0010), QStringLiteral("x")}, "reserves a private block"},
 };
-INSTANTIATE_TEST_SUITE_P(Table, RefusedEdit, testing::ValuesIn(kRefused), nameOf<Refused>);
+
+TEST_F(TagFileQAEdit, ThatIsRefusedChangesNoImageAtAll)
+{
+    const QByteArray before = content();
+    for (const Refused& row : kRefused) {
+        const QAData job = edit({"1", "3", "2"}, {{DCM_PatientName, text("Roe")}, row.substitution});
+        EXPECT_THAT(refusal(job), testing::HasSubstr(row.reason)) << row.name;
+        EXPECT_EQ(content(), before) << row.name;
+    }
+}
 
 TEST_F(TagFileQAEdit, TakesEveryFormThatAValueMayHave)
 {

@@ -1,5 +1,4 @@
 #include "TagFileFixture.h"
-#include "kddlib/volumes/Volume.h"
 #include "platform/database/DirectoryEntry.h"
 
 namespace Kdd
@@ -8,10 +7,6 @@ namespace
 {
 
 using Entry = Kxg::DicomDirectoryEntry;
-
-const DcmTagKey kFileSuffix(0x0006, 0x7101);
-const DcmTagKey kHasVolumeFile(0x0006, 0x7108);
-const DcmTagKey kAbstract(0x0006, 0x7120);
 
 /// What the database says, and two series "1.2.3" (images 1 and 2) and "1.2.4" (image 3) in the tag file.
 class TagFileSyncTest : public TagFileTest
@@ -44,6 +39,14 @@ protected:
         entry.flags = Entry::HasVolume;
         entry.name = name;
         return entry;
+    }
+
+    static QList<QByteArray> namesOf(const TagMap& series)
+    {
+        QList<QByteArray> names;
+        for (const Volume* volume : series.volumes())
+            names.append(volume->volumeFileName());
+        return names;
     }
 
     static QByteArray textOf(const TagMap* node, const DcmTagKey& key)
@@ -104,8 +107,10 @@ TEST_F(TagFileSyncTest, AnImageIsLetGoOfUnderWhateverKey)
     file.findImage("1")->deleteElement(kFilePath);
     file.findSeries("1.2.4")->putAndInsertString(DCM_SeriesInstanceUID, "other");
     file.findImage("2")->putAndInsertValue(kFilePath, VrCode::LO, "/2");
+    file.findSeries("1.2.3")->putAndInsertValue(kFilePath, VrCode::LO, "/of/the/series");
     file.removeImagesWithoutFilename(file.findSeries("1.2.3"));
     EXPECT_EQ(file.imagesByUID().keys(), (Uids{"2", "3"}));
+    EXPECT_EQ(file.findSeries("1.2.3")->children(), QList<TagMap*>{file.findImage("2")});
     const char* uids[] = {"3"};
     EXPECT_EQ(file.removeImages(1, uids), 1);
     EXPECT_EQ(file.seriesByUID().keys(), Uids{"1.2.3"});
@@ -131,8 +136,11 @@ TEST_F(TagFileSyncTest, ASkeletonInheritsAndHidesNothing)
     info.images = {{"8", "/new/8"}};
     bool complete = true;
     file.copyDatabaseValuesIntoTagMap(*study);
-    file.addDicomFilePaths(file.findSeries("1.2.7"), &info, true, complete);
+    EXPECT_EQ(file.addDicomFilePaths(file.findSeries("1.2.7"), &info, true, complete), 1);
+    EXPECT_TRUE(complete);
     const TagMap* image = file.findImage("8");
+    EXPECT_EQ(image->parent(), file.findSeries("1.2.7"));
+    EXPECT_TRUE(image->tagsForLevel().value(DCM_PixelData)->markedAsOmitted());
     for (const DcmTagKey& key : {DCM_PatientName, DCM_StudyInstanceUID})
         EXPECT_EQ(textOf(image, key), textOf(file.findImage("1"), key));
     EXPECT_EQ(textOf(file.findSeries("1.2.7"), DCM_Modality), "MR");
@@ -163,32 +171,31 @@ struct VolumeName
     int warnings;
 };
 
-class VolumeNames : public TagFileSyncTest, public testing::WithParamInterface<VolumeName>
-{
+const VolumeName kVolumeNames[] = {
+    {"a-b.vol", {"a-b.vol", ""}, 0},
+    {"a_part002.vol", {"", "a_part002.vol"}, 0},
+    {"a_part2", {"", "a_part2"}, 0},
+    {"a_part1", {"", ""}, 0},
+    {"a_part001.vol", {"", ""}, 0},
+    {"a_part.vol", {"", ""}, 0},
+    {"a_part003.vol", {"", ""}, 1},
+    {"a_part99999999999999.vol", {"", ""}, 1},
+    {"", {"", ""}, 0},
 };
 
-TEST_P(VolumeNames, ChooseTheVolume)
+TEST_F(TagFileSyncTest, TheNameOfAVolumeFileChoosesTheVolume)
 {
-    const LogCapture log;
     TagMap* series = file.findSeries("1.2.3");
-    series->addBareVolume(new Volume(0));
-    series->addBareVolume(new Volume(1));
-    file.addVolumeFilePath(series, volumeFile(GetParam().name), false);
-    QList<QByteArray> names;
-    for (const Volume* volume : series->volumes())
-        names.append(volume->volumeFileName());
-    EXPECT_EQ(names, GetParam().names);
-    EXPECT_EQ(static_cast<int>(log.lines().size()), GetParam().warnings);
+    for (const VolumeName& row : kVolumeNames) {
+        const LogCapture log;
+        series->clearVolumes();
+        series->addBareVolume(new Volume(0));
+        series->addBareVolume(new Volume(1));
+        file.addVolumeFilePath(series, volumeFile(row.name), false);
+        EXPECT_EQ(namesOf(*series), row.names) << row.name;
+        EXPECT_EQ(static_cast<int>(log.lines().size()), row.warnings) << row.name;
+    }
 }
-
-INSTANTIATE_TEST_SUITE_P(
-    Sync, VolumeNames,
-    testing::Values(VolumeName{"a-b.vol", {"a-b.vol", ""}, 0},
-                    VolumeName{"a_part002.vol", {"", "a_part002.vol"}, 0},
-                    VolumeName{"a_part2", {"", "a_part2"}, 0}, VolumeName{"a_part1", {"", ""}, 0},
-                    VolumeName{"a_part001.vol", {"", ""}, 0}, VolumeName{"a_part.vol", {"", ""}, 0},
-                    VolumeName{"a_part003.vol", {"", ""}, 1},
-                    VolumeName{"a_part99999999999999.vol", {"", ""}, 1}, VolumeName{"", {"", ""}, 0}));
 
 TEST_F(TagFileSyncTest, VolumesAreNamedByTheirSuffixWhereTheNumbersHaveGaps)
 {
@@ -201,10 +208,7 @@ TEST_F(TagFileSyncTest, VolumesAreNamedByTheirSuffixWhereTheNumbersHaveGaps)
     for (const char* name :
          {"x-volume_part2.vol", "y-volume_part011.vol", "x-volume_part3.vol", "x-volume.vol"})
         file.addVolumeFilePath(series, volumeFile(name), false);
-    QList<QByteArray> names;
-    for (const Volume* volume : series->volumes())
-        names.append(volume->volumeFileName());
-    EXPECT_EQ(names, (QList<QByteArray>{"x-volume.vol", "x-volume_part3.vol", "y-volume_part011.vol"}));
+    EXPECT_EQ(namesOf(*series), (Uids{"x-volume.vol", "x-volume_part3.vol", "y-volume_part011.vol"}));
     EXPECT_EQ(log.count("Volume x-volume_part2.vol not found in tag map"), 1);
 }
 
@@ -222,17 +226,6 @@ TEST_F(TagFileSyncTest, MissingVolumesAreMadeInTheirOrder)
     EXPECT_EQ(series->volumes().size(), 2) << "a DICOM file is no volume";
     file.addVolumeFilePath(series, volumeFile("a_part005.vol"), true);
     EXPECT_EQ(series->volumes().size(), 2) << "it is there";
-}
-
-TEST_F(TagFileSyncTest, MissingImagesAreMadeOnRequest)
-{
-    Kxg::SeriesInfo info;
-    info.images = {{"1", "/new/1"}, {"8", "/new/8"}};
-    bool complete = true;
-    EXPECT_EQ(file.addDicomFilePaths(file.findSeries("1.2.3"), &info, true, complete), 2);
-    EXPECT_TRUE(complete);
-    EXPECT_EQ(file.findImage("8")->parent(), file.findSeries("1.2.3"));
-    EXPECT_TRUE(file.findImage("8")->tagsForLevel().value(DCM_PixelData)->markedAsOmitted());
 }
 
 TEST_F(TagFileSyncTest, LabelsTellSeriesApart)

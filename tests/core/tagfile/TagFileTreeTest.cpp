@@ -1,5 +1,4 @@
 #include "TagFileFixture.h"
-#include "kddlib/volumes/Volume.h"
 
 #include <array>
 
@@ -93,7 +92,7 @@ TEST_F(TagFileTree, TakesUidsAndPathsThatAreItsOwn)
     TagFile file;
     add(file, anImage("1"), "/store/1_a.dcm");
     add(file, anImage("2"), "/store/2_a.dcm");
-    const char* path = file.findImage("2")->findElement(DcmTagKey(0x0006, 0x7101))->value().constData();
+    const char* path = file.findImage("2")->findElement(kFileSuffix)->value().constData();
     EXPECT_EQ(file.addTagMap(file.findImage("2"), nullptr, true), file.findImage("2")) << "held already";
     EXPECT_NE(file.addTagMap(anImage("2").map(), path, true), nullptr);
     const QByteArray& own = file.findImage("1")->findElement(DCM_SOPInstanceUID)->value();
@@ -142,35 +141,16 @@ TEST_F(TagFileTree, TheMetaFolderEndsInASlash)
     EXPECT_EQ(log.count("Meta folder set to C:/data/"), 1);
 }
 
-TEST_F(TagFileTree, ATakenImageShowsAllThatItShowedAndLeavesItsSeries)
+TEST_F(TagFileTree, ATakenImageLeavesItsSeriesAndOutlivesItsTree)
 {
     TagFile file;
-    const auto image = [](const char* uid) {
-        return anImage(uid).withItem(DCM_RequestAttributesSequence, anItem().with(DCM_CodeValue, uid));
-    };
-    add(file, image("1"));
-    add(file, image("2"));
-    const std::unique_ptr<TagMap> taken(file.takeImage("2"));
-    ASSERT_NE(taken, nullptr);
-    EXPECT_EQ(file.takeImage("2"), nullptr);
-    const std::unique_ptr<TagMap> last(file.takeImage("1"));
+    add(file, anImage("1"));
+    const std::string shown = shownText(*file.findImage("1"));
+    const std::unique_ptr<TagMap> taken(file.takeImage("1"));
     EXPECT_NE(file.findSeries("1.2.3"), nullptr);
-    EXPECT_TRUE(file.imagesByUID().isEmpty());
     file.deleteEmptyNodes();
     EXPECT_TRUE(file.isEmpty() && file.seriesByUID().isEmpty());
-    EXPECT_EQ(shownText(*taken), shownAlone(image("2"))) << "also without its tree";
-}
-
-TEST_F(TagFileTree, OnlyAFilePathOfItsOwnKeepsAnImage)
-{
-    TagFile file;
-    for (const char* uid : {"1", "2", "3"})
-        add(file, anImage(uid));
-    file.findSeries("1.2.3")->putAndInsertValue(kFilePath, VrCode::LO, "/of/the/series");
-    file.findImage("2")->putAndInsertValue(kFilePath, VrCode::LO, "/of/the/image");
-    file.removeImagesWithoutFilename(file.findSeries("1.2.3"));
-    EXPECT_EQ(file.imagesByUID().keys(), Uids{"2"});
-    EXPECT_EQ(file.findSeries("1.2.3")->children(), QList<TagMap*>{file.findImage("2")});
+    EXPECT_EQ(shownText(*taken), shown);
 }
 
 TEST_F(TagFileTree, AnImageWithoutSopInstanceUidIsKnownByItsPathForGood)
@@ -189,36 +169,6 @@ TEST_F(TagFileTree, AnImageWithoutSopInstanceUidIsKnownByItsPathForGood)
     ASSERT_TRUE(read.readCacheFileForStudy("1.2", false));
     EXPECT_EQ(read.imagesByUID().keys(), (Uids{"/a.dcm", "/b.dcm", "/c.dcm"}));
     EXPECT_EQ(imagesText(read), imagesText(second));
-}
-
-/// A volume of the images that a builder of volumes has found.
-class BuiltVolume : public Volume
-{
-public:
-    explicit BuiltVolume(const QVector<TagMap*>& images)
-    {
-        setImages(images, nullptr);
-        setMultiFrameInfo({});
-    }
-};
-
-/// One that replaces another under its UID takes its place, as it does when the study is built anew.
-TEST_F(TagFileTree, VolumesForgetTheImagesThatGo)
-{
-    TagFile file;
-    for (const char* uid : {"1", "2", "3", "4"})
-        add(file, anImage(uid));
-    auto* volume = new Volume(BuiltVolume(file.imagesByUID().values().toVector()));
-    file.findSeries("1.2.3")->addBareVolume(volume);
-    const char* uid = "1";
-    EXPECT_EQ(file.removeImages(1, &uid), 1);
-    delete file.takeImage("2");
-    add(file, anImage("3"));
-    ASSERT_EQ(volume->numImages(), 2);
-    EXPECT_EQ(volume->image(0), file.findImage("3"));
-    EXPECT_EQ(volume->image(1), file.findImage("4"));
-    add(file, anImage("4").inSeries("1.2.4"));
-    EXPECT_EQ(volume->numImages(), 1) << "a volume is of one series";
 }
 
 }  // namespace

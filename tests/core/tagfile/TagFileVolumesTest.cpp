@@ -1,6 +1,4 @@
 #include "TagFileFixture.h"
-#include "kddlib/volumes/Volume.h"
-#include "kddlib/volumes/VolumeInfo.h"
 
 #include <algorithm>
 
@@ -8,8 +6,6 @@ namespace Kdd
 {
 namespace
 {
-
-const DcmTagKey kVolumeIndex(0x0006, 0x7103);
 
 /// A study of six images in one series, numbered from 1.
 class TagFileVolumesTest : public TagFileTest
@@ -29,20 +25,7 @@ protected:
 
     static VolumeInfo info(const std::vector<std::string>& imageUIDs, const char* name = "1-volume.vol")
     {
-        VolumeInfo info;
-        info.imageUIDs = imageUIDs;
-        info.name = name;
-        info.dims = {4, 4, static_cast<int>(imageUIDs.size())};
-        info.histogram = KxHistogram({3, 4}, 0, 100);
-        return info;
-    }
-
-    void addVolumes(std::vector<VolumeInfo> infos)
-    {
-        std::vector<VolumeInfo*> pointers;
-        for (VolumeInfo& each : infos)
-            pointers.push_back(&each);
-        file.addVolumeInfo(pointers);
+        return aVolume(imageUIDs, name);
     }
 
     QByteArray indexesOf(const char* sopUID) const
@@ -59,8 +42,11 @@ protected:
 TEST_F(TagFileVolumesTest, AnImageInSeveralVolumesListsThemByteByByte)
 {
     const LogCapture log;
-    addVolumes(
-        {info({"1", "2", "3"}), info({"nobody"}), info({"4", "3", "stranger"}, "1-volume_part003.vol")});
+    add(file, imageNumbered(7).inSeries("1.2.9"));
+    addVolumes(file, {info({"1", "2", "7", "3"}), info({"nobody"}),
+                      info({"4", "3", "stranger"}, "1-volume_part003.vol")});
+    EXPECT_EQ(log.count("3D volume 1-volume.vol contains image 7 of another series, 1.2.9"), 1);
+    EXPECT_EQ(indexesOf("7"), "none");
     EXPECT_EQ(indexesOf("1"), "00");
     EXPECT_EQ(indexesOf("3"), "0002");
     EXPECT_EQ(indexesOf("4"), "02");
@@ -71,18 +57,6 @@ TEST_F(TagFileVolumesTest, AnImageInSeveralVolumesListsThemByteByByte)
     EXPECT_EQ(volumes().last()->sopUIDList(), (std::vector<std::string>{"4", "3"}))
         << "slices keep the file's order";
     EXPECT_EQ(log.count("3D volume 1-volume_part003.vol contains unknown image stranger"), 1);
-}
-
-TEST_F(TagFileVolumesTest, AVolumeBelongsToOneSeries)
-{
-    const LogCapture log;
-    add(file, imageNumbered(7).inSeries("1.2.9"));
-    addVolumes({info({"1", "7", "2"})});
-    EXPECT_EQ(log.count("3D volume 1-volume.vol contains image 7 of another series, 1.2.9"), 1);
-    EXPECT_EQ(indexesOf("7"), "none");
-    const char* uids[] = {"7", "1"};
-    EXPECT_EQ(file.removeImages(2, uids), 2);
-    EXPECT_EQ(volumes().first()->sopUIDList(), std::vector<std::string>{"2.0"});
 }
 
 /// The volumes, by their suffixes, as a reader finds them: the images of their slices.
@@ -109,7 +83,7 @@ protected:
 TEST_F(WrittenVolumes, StayRightWhenOneHasLostItsImages)
 {
     const LogCapture log;
-    addVolumes({info({"1", "2"}, "x-a.vol"), info({"3"}, "x-b.vol"), info({"5", "4"}, "x-c.vol")});
+    addVolumes(file, {info({"1", "2"}, "x-a.vol"), info({"3"}, "x-b.vol"), info({"5", "4"}, "x-c.vol")});
     const char* uids[] = {"3", "2"};
     file.removeImages(2, uids);
     EXPECT_EQ(reread(), "a: 1 -\nc: 5 4\n");
@@ -119,8 +93,8 @@ TEST_F(WrittenVolumes, StayRightWhenOneHasLostItsImages)
 
 TEST_F(WrittenVolumes, StayRightWhenIndexesRepeat)
 {
-    addVolumes({info({"1", "2"}, "x-a.vol"), info({"3", "2"}, "x-b.vol")});
-    addVolumes({info({"4", "2"}, "x-c.vol"), info({"nobody"}), info({"5", "6", "5"}, "x-d.vol")});
+    addVolumes(file, {info({"1", "2"}, "x-a.vol"), info({"3", "2"}, "x-b.vol")});
+    addVolumes(file, {info({"4", "2"}, "x-c.vol"), info({"nobody"}), info({"5", "6", "5"}, "x-d.vol")});
     EXPECT_EQ(reread(), "a: 1 2\nc: 4 2\nb: 3 2\nd: 5 6 5\n");
     EXPECT_EQ(reread(), "a: 1 2\nc: 4 2\nb: 3 2\nd: 5 6 5\n");
 }
@@ -139,7 +113,7 @@ TEST_F(WrittenVolumes, StayRightWhereOneByteCannotTellThemApart)
         (isShared ? expected.insert(i == 7 ? 0 : 5, std::to_string(i) + ": 1\n")
                   : expected += std::to_string(i) + ": " + uid.toStdString() + '\n');
     }
-    addVolumes(infos);
+    addVolumes(file, infos);
     EXPECT_EQ(reread(), expected);
 }
 
@@ -149,7 +123,7 @@ TEST_F(WrittenVolumes, AreLeftOutWhenNoByteIsLeft)
     std::vector<VolumeInfo> infos;
     for (int i = 0; i < 257; ++i)
         infos.push_back(info({"1"}, ("x-" + std::to_string(i) + ".vol").c_str()));
-    addVolumes(infos);
+    addVolumes(file, infos);
     ASSERT_EQ(volumes().size(), 257);
     const std::string text = reread();
     EXPECT_EQ(std::count(text.begin(), text.end(), '\n'), 256);
@@ -158,24 +132,9 @@ TEST_F(WrittenVolumes, AreLeftOutWhenNoByteIsLeft)
     EXPECT_EQ(log.count("Volume 256 of series 1.2.3 is left out of the tag file"), 1);
 }
 
-TEST_F(TagFileVolumesTest, VolumesAndTheirImagesComeBackFromTheFile)
-{
-    addVolumes({info({"1", "2", "3"}), info({"6", "5", "4"}, "1-volume_part002.vol")});
-    file.optimizeAll();
-    TagFile again;
-    ASSERT_TRUE(read(again, written(file)));
-    const QList<Volume*>& volumesAgain = again.seriesByUID().first()->volumes();
-    ASSERT_EQ(volumesAgain.size(), 2);
-    for (int i = 0; i < 2; ++i) {
-        EXPECT_EQ(volumesAgain.at(i)->sopUIDList(), volumes().at(i)->sopUIDList());
-        EXPECT_EQ(volumesAgain.at(i)->volumeHash(), volumes().at(i)->volumeHash());
-        EXPECT_EQ(volumesAgain.at(i)->histogram().total(), 7U);
-    }
-}
-
 TEST_F(TagFileVolumesTest, ADuplicateHasImagesOfItsOwn)
 {
-    addVolumes({info({"3", "1", "2"})});
+    addVolumes(file, {info({"3", "1", "2"})});
     TagMap& series = *file.seriesByUID().first();
     const Volume* copy = volumes().first()->duplicate(file, series);
     EXPECT_EQ(file.imagesByUID().size(), 9);
@@ -194,7 +153,7 @@ TEST_F(TagFileVolumesTest, ADuplicateHasImagesOfItsOwn)
 /// A series with volumes keeps them, whichever of the two has more images.
 TEST_F(TagFileVolumesTest, AMergeKeepsVolumes)
 {
-    addVolumes({info({"1", "2", "3"})});
+    addVolumes(file, {info({"1", "2", "3"})});
     ASSERT_TRUE(file.mergeIntoCacheFile());
     TagFile many;
     for (int i = 4; i <= 14; ++i)
@@ -207,7 +166,7 @@ TEST_F(TagFileVolumesTest, AMergeKeepsVolumes)
     EXPECT_EQ(whole.seriesByUID().first()->volumes().first()->sopUIDList(), volumes().first()->sopUIDList());
     file.clear();
     add(file, imageNumbered(20));
-    addVolumes({info({"20"})});
+    addVolumes(file, {info({"20"})});
     ASSERT_TRUE(file.mergeIntoCacheFile());
     ASSERT_EQ(volumes().size(), 1) << "the fresh volume was made from all that is known";
     EXPECT_EQ(volumes().first()->sopUIDList(), std::vector<std::string>{"20"});

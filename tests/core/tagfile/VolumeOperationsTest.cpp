@@ -1,7 +1,5 @@
 #include "TagFileFixture.h"
 #include "kddlib/tagfile/qa/QAData.h"
-#include "kddlib/volumes/Volume.h"
-#include "kddlib/volumes/VolumeInfo.h"
 #include "platform/database/DirectoryEntry.h"
 
 #include <random>
@@ -47,14 +45,12 @@ protected:
         for (int i = 1; i <= kImages; ++i)
             place(mFile, QByteArray::number(i), anySeries());
         mFile.addTagMap(anImage().inSeries("1.2.0").without(DCM_SOPInstanceUID).map(), "/a\\b", false);
-        std::vector<VolumeInfo> infos(static_cast<std::size_t>(any(6)));
-        std::vector<VolumeInfo*> pointers;
-        for (VolumeInfo& info : infos) {
-            describe(info, static_cast<int>(pointers.size()));
-            pointers.push_back(&info);
-            expect(info);
+        std::vector<VolumeInfo> infos;
+        for (int i = any(6); i > 0; --i) {
+            infos.push_back(anyVolume(i));
+            expect(infos.back());
         }
-        mFile.addVolumeInfo(pointers);
+        addVolumes(mFile, infos);
     }
 
     void place(TagFile& file, const QByteArray& uid, const QByteArray& series)
@@ -66,10 +62,9 @@ protected:
     }
 
     /// Images of other series, strangers, images twice and frames included.
-    void describe(VolumeInfo& info, int number)
+    VolumeInfo anyVolume(int number)
     {
-        info.name = "x-stack_part" + QByteArray::number(number) + "1.vol";
-        info.histogram = KxHistogram({1}, 0, 1);
+        VolumeInfo info = aVolume({}, ("x-stack_part" + QByteArray::number(number) + "1.vol").constData());
         const bool hasFrames = any(3) == 0;
         std::set<std::string> uids;
         for (int i = 1 + any(8); i > 0; --i) {
@@ -79,7 +74,8 @@ protected:
             if (!hasFrames || uids.insert(uid).second)
                 info.imageUIDs.push_back(uid);
         }
-        info.dims = {8, 8, static_cast<int>(info.imageUIDs.size())};
+        info.dims.z = static_cast<int>(info.imageUIDs.size());
+        return info;
     }
 
     void expect(const VolumeInfo& info)

@@ -1,3 +1,5 @@
+#include "kddlib/Limits.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/Volume.h"
@@ -13,14 +15,13 @@
 namespace
 {
 
+using Kdd::kVolumeIndex;
 using Kdd::KxMsg;
 using Kdd::Slice;
 using Kdd::TagMap;
 using Kdd::Volume;
 
 using Blobs = QList<QByteArray>;
-
-const DcmTagKey kVolumeIndex(0x0006, 0x7103);
 
 constexpr int kBeforeCode = 12 + 24 + 64 + 2;
 
@@ -226,6 +227,24 @@ TEST(VolumeList, ACountOfVolumesIsHeldAgainstWhatIsThere)
         series.deserializeVolumes(list, {});
         EXPECT_TRUE(list.failed()) << count;
         EXPECT_TRUE(series.volumes().isEmpty());
+    }
+}
+
+TEST(VolumeList, NamesNoMoreImagesThanItsReaderTakes)
+{
+    Series empty;
+    empty.addStack();
+    QByteArray indexes;
+    for (int i = 0; i < 256; ++i)
+        indexes.append(char(i));
+    for (const int tooMany : {0, 1}) {
+        Series series;
+        for (int i = 0; i < Kdd::kMaxVolumeImages / 256 + tooMany; ++i)
+            series.node.addChildMap(new TagMap, TagMap::ItemLevel);
+        series.node.putAndInsertValue(kVolumeIndex, Kdd::VrCode::OB, indexes);
+        series.addStack();
+        EXPECT_EQ(series.written().isEmpty(), tooMany == 1);
+        EXPECT_EQ(series.read(empty.written()), tooMany == 0);
     }
 }
 

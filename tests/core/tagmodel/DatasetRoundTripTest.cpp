@@ -1,5 +1,5 @@
 #include "kddlib/Limits.h"
-#include "kddlib/net/dicom/DicomFileReader.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/tagmodel/TagSequence.h"
 #include "support/DatasetBuilder.h"
@@ -19,8 +19,6 @@ using namespace Kdd;
 
 namespace
 {
-
-const DcmTagKey kTransferSyntax(0x0006, 0x7102);
 
 const E_TransferSyntax kSyntaxes[] = {EXS_LittleEndianImplicit, EXS_LittleEndianExplicit,
                                       EXS_BigEndianExplicit, EXS_DeflatedLittleEndianExplicit};
@@ -137,7 +135,7 @@ protected:
     {
         const OFCondition written = DcmFileFormat(&dataset).saveFile(path().constData(), xfer);
         EXPECT_TRUE(written.good()) << written.text();
-        EXPECT_TRUE(readDicomFile(path().constData(), read).good());
+        EXPECT_TRUE(read.loadFile(path().constData()).good());
     }
 
     /// Whether a file of the dataset is the same after it has gone through the cache.
@@ -209,7 +207,9 @@ TEST_F(DatasetRoundTrip, KeepsEveryByteOfRealFiles)
          {"modalities", "multiframe", "charsets", "series", "odd", "transfer-syntaxes"}) {
         for (const QString& name : realFiles(folder)) {
             DcmFileFormat file;
-            if (readDicomFile(name.toLocal8Bit().constData(), file).bad())
+            // One file nests so deep that DCMTK's own reading would end the process.
+            if (name.contains(QLatin1String("Deeply-Nested")) ||
+                file.loadFile(name.toLocal8Bit().constData()).bad())
                 continue;
             const E_TransferSyntax xfer = file.getDataset()->getOriginalXfer();
             file.getDataset()->findAndDeleteElement(DCM_PixelData, OFTrue, OFTrue);

@@ -18,27 +18,23 @@ struct Reduction
     Triple factors;
 };
 
-class LowResolution : public testing::TestWithParam<Reduction>
-{
+const Reduction kReductions[] = {
+    {{512, 512, 512}, {256, 256, 256}, {2, 2, 2}}, {{256, 200, 100}, {256, 200, 100}, {1, 1, 1}},
+    {{300, 513, 513}, {150, 256, 256}, {2, 2, 2}}, {{514, 771, 2000}, {171, 192, 500}, {3, 4, 4}},
+    {{0, -5, 1019}, {0, -5, 509}, {1, 1, 2}},      {{256, 257, 1020}, {256, 128, 340}, {1, 2, 3}},
 };
 
-TEST_P(LowResolution, DividesEachAxisByTheSmallestFactorThatFits)
+TEST(LowResolution, DividesEachAxisByTheSmallestFactorThatFits)
 {
-    Triple lowRes{};
-    Triple factors{};
-    const bool isReduced = computeLowResSize(GetParam().dims.data(), lowRes.data(), factors.data());
-    EXPECT_EQ(lowRes, GetParam().lowRes);
-    EXPECT_EQ(factors, GetParam().factors);
-    EXPECT_EQ(isReduced, (factors != Triple{1, 1, 1}));
+    for (const Reduction& row : kReductions) {
+        Triple lowRes{};
+        Triple factors{};
+        const bool isReduced = computeLowResSize(row.dims.data(), lowRes.data(), factors.data());
+        EXPECT_EQ(lowRes, row.lowRes);
+        EXPECT_EQ(factors, row.factors) << row.dims[0];
+        EXPECT_EQ(isReduced, (factors != Triple{1, 1, 1})) << row.dims[0];
+    }
 }
-
-INSTANTIATE_TEST_SUITE_P(Volumes, LowResolution,
-                         testing::Values(Reduction{{512, 512, 512}, {256, 256, 256}, {2, 2, 2}},
-                                         Reduction{{256, 200, 100}, {256, 200, 100}, {1, 1, 1}},
-                                         Reduction{{300, 513, 513}, {150, 256, 256}, {2, 2, 2}},
-                                         Reduction{{514, 771, 2000}, {171, 192, 500}, {3, 4, 4}},
-                                         Reduction{{0, -5, 1019}, {0, -5, 509}, {1, 1, 2}},
-                                         Reduction{{256, 257, 1020}, {256, 128, 340}, {1, 2, 3}}));
 
 TEST(LowResolutionBox, PutsEachVoxelIntoTheMiddleOfItsBlock)
 {

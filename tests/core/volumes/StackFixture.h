@@ -1,6 +1,7 @@
 #pragma once
 
 #include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/StackPlanner.h"
 #include "support/DatasetBuilder.h"
@@ -15,8 +16,6 @@
 
 namespace Kdd
 {
-
-const DcmTagKey kFilePath(0x0006, 0x7100);
 
 /// An axial image of 4 x 3 pixels of 16 bits, half a millimetre wide and 0.25 mm high, at (x, y, z) [mm].
 inline DatasetBuilder aSlice(int number, double z, double y = 0, double x = 0)
@@ -94,14 +93,6 @@ public:
                 plans.push_back(planStacks(*series, reference));
         }
         return plans;
-    }
-
-    /// As `ImagePath`.
-    static QByteArray pathOf(const TagMap& image)
-    {
-        QByteArray path;
-        image.findAndGetString(kFilePath, path);
-        return path;
     }
 
 private:

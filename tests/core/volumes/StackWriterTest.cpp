@@ -65,7 +65,7 @@ protected:
     /// Writes and opens the volume.
     const OrlanMesh& written(const Stack& stack)
     {
-        Result result = writeStack(stack, StackSeries::pathOf, path("1-volume.vol"));
+        Result result = writeStack(stack, filePathOf, path("1-volume.vol"));
         if (result.good())
             mMesh = OrlanMesh::read(path("1-volume.vol"), result);
         if (result.bad())
@@ -94,8 +94,7 @@ protected:
         double worst = 0;
         for (int z = 0; z < stack.slices.size(); ++z) {
             const std::vector<double> voxels = slice(z);
-            const std::vector<double> expected =
-                physicalValues(StackSeries::pathOf(stack.slices.at(z).tags.image()));
+            const std::vector<double> expected = physicalValues(filePathOf(stack.slices.at(z).tags.image()));
             EXPECT_EQ(voxels.size(), expected.size());
             for (std::size_t i = 0; i < voxels.size(); ++i)
                 worst = qMax(worst, std::fabs((voxels[i] * scale + bias - expected[i]) / scale));
@@ -204,7 +203,7 @@ TEST_F(StackWriter, LeavesNothingBehindWhenASliceFails)
     const Stack stack = saved(atZ({0, 1, 2}));
     QFile::remove(QFile::decodeName(path("2.dcm")));
     const std::pair<ImagePath, const char*> faults[] = {
-        {StackSeries::pathOf, "2.dcm"},
+        {filePathOf, "2.dcm"},
         {[&](const TagMap&) { return path("3.dcm"); }, "The file holds image 3 instead of 1"},
         {[&](const TagMap&) { return QByteArray(); }, "The image has no file"},
     };

@@ -76,6 +76,27 @@ TEST_F(VolumeTest, TheHashIsThatOfAllIdentifiersAndIsKept)
     EXPECT_EQ(volume.volumeHash(), "2F69F730DE7A4AE3E9EE57BF5EEA1B9E");
 }
 
+TEST(VolumesOfANode, AreItsOwnAndOnlySharedByItsCopies)
+{
+    TagMap series;
+    Volume guest;
+    series.addBareVolume(new Volume);
+    series.addBareVolume(series.volumes().first());
+    series.volumes().first()->setFileNameSuffix("suffix");
+    {
+        TagMap copy(series);
+        copy.addBareVolume(&guest);
+        EXPECT_EQ(copy.volumes(), (QList<Volume*>{series.volumes().first(), &guest}));
+        copy.clearVolumes();
+        EXPECT_TRUE(copy.volumes().isEmpty());
+        copy = series;
+    }
+    ASSERT_EQ(series.volumes().size(), 1);
+    EXPECT_EQ(series.volumes().first()->volumeIndex() + guest.volumeIndex(), 1 + 2);
+    series.removeTagsNotNeededByClient();
+    EXPECT_EQ(series.volumes().first()->fileNameSuffix(), "");
+}
+
 TEST(VolumeFileName, HasASuffix)
 {
     const std::pair<const char*, const char*> files[] = {

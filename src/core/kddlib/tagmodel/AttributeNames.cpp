@@ -92,6 +92,7 @@ bool resolveAttributeName(const QString& name, DcmTagKey& key)
     const QMutexLocker lock(&mutex);
     auto known = remembered.constFind(name);
     if (known == remembered.constEnd()) {
+        // All at once: who asks for thousands of names asks for names that do not exist, and the few others come back.
         if (remembered.size() >= kMaxRemembered)
             remembered.clear();
         known = remembered.insert(name, resolve(name));

@@ -117,6 +117,8 @@ std::unique_ptr<DcmElement> bytesElement(VrCode vr, const DcmTag& tag, const QBy
 
 }  // namespace
 
+/// The dictionary's tag where it agrees, for it may ask for a younger VR than a code can tell; else one of our own VR:
+/// an unknown tag would have DCMTK write words as nothing and sequences as bytes.
 DcmTag TagElement::tagFor(const DcmTagKey& key) const
 {
     DcmTag known(key);

@@ -54,6 +54,7 @@ CreatorSearch findCreator(const TagMap& map, const DcmTagKey& key, const char* c
     const TagMap::iterator end = map.end();
     for (TagMap::iterator it = map.lowerBound(creatorKey(key, kFirstBlock)); it != end && it.key() <= last;
          ++it) {
+        // Up to the NUL and no trimming: a creator with a blank at its end is another one.
         if (std::strcmp(it.value()->value().constData(), creator) == 0) {
             search.found = it.key().getElement();
             break;

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "kddlib/tagmodel/VolumeHolder.h"
 #include "kddlib/tagmodel/VrCode.h"
 #include "platform/base/Export.h"
 
@@ -28,7 +29,6 @@ namespace Kdd
 class KxMsg;
 class TagElement;
 class TagSequence;
-class Volume;
 class VolumeImages;
 
 /// One node of a study's tree: the study, a series, an image, or an item of a sequence.
@@ -210,6 +210,9 @@ public:
     /// Writes the node's own entries with lengths and attribute names; a missing marker shows as "--".
     void listContent(QTextStream& out, int indent) const;
 
+    // What follows, but for the upkeep of the volumes' list, is defined by the rooms above: they know what a preview, a
+    // volume and a record is, and the tag model never asks.
+
     // ---- previews
 
     /// The JPEG that represents this node best: its own or its parent's, that of the volume with the most slices
@@ -219,8 +222,14 @@ public:
 
     // ---- volumes
 
-    const QList<Volume*>& volumes() const { return mVolumes; }
+    /// Until the next volume comes or goes.
+    const QList<Volume*>& volumes() const;
+
+    /// Takes the volume over; one that is here already stays where it is. An index that is negative becomes the number
+    /// of volumes.
     void addBareVolume(Volume* volume);
+
+    /// Deletes the volumes; a copy only lets go of them.
     void clearVolumes();
 
     // ---- tag file records
@@ -288,7 +297,9 @@ private:
 
     /// Takes the places of another image in its volumes; that one is in none of them any more.
     void takeVolumePlaces(TagMap& former);
-    void forgetVolumeSuffixes();
+
+    /// The volumes, to be changed.
+    QList<Volume*>& obtainVolumes();
     void releaseAll();
 
     TagElement* ownElement(const DcmTagKey& key) const { return mTags.value(key, nullptr); }
@@ -335,7 +346,7 @@ private:
 
     TagMap* mParent = nullptr;
     QList<TagMap*> mChildren;
-    QList<Volume*> mVolumes;
+    std::unique_ptr<VolumeHolder> mVolumes;  // null without volumes
     QVector<VolumePlace> mVolumePlaces;
     Tags mTags;
     bool mIsSequenceItem = false;

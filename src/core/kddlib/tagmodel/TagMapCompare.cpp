@@ -58,6 +58,7 @@ bool TagMap::compare(const TagMap& other, bool strict, std::string* diffs) const
             append(diffs, text(mine != last ? mine : theirs) + " Missing tag\n");
             return false;
         }
+        // The walks are not brought together again: one line of what differs first is what callers show.
         if (mine.key() != theirs.key()) {
             append(diffs, text(mine) + " <> " + text(theirs) + "\n");
             return false;

@@ -71,6 +71,7 @@ bool isLongerThan(DcmElement& element, unsigned int bound)
            element.getLength(EXS_LittleEndianImplicit, EET_UndefinedLength) > bound;
 }
 
+/// DCMTK hands out null for a text without characters; that is an empty value and no missing one.
 OFCondition copyText(DcmElement& element, QByteArray& value)
 {
     char* text = nullptr;
@@ -164,6 +165,7 @@ void TagMap::addElement(DcmElement& element, unsigned int maxLength)
 TagElement* TagMap::setElement(DcmElement* element)
 {
     const DcmTagKey key(element->getGTag(), element->getETag());
+    // Copied aside, because reading may fail; callers hold on to the element, so one that is there is changed in place.
     TagElement* held = ownElement(key);
     auto copy = std::make_unique<TagElement>(VrCode::UN, held != nullptr ? held->value() : QByteArray());
     // NOLINTNEXTLINE(clang-analyzer-unix.Malloc): a condition frees the text it owns

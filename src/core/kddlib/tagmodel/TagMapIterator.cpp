@@ -19,6 +19,7 @@ void TagMap::iterator::choose()
 
 void TagMap::iterator::step()
 {
+    // Every level moves on past the key, so that a value that a nearer node replaces is not seen after it.
     const DcmTagKey passed = key();
     for (int i = 0; i < mCount; ++i) {
         if (!mLevels[i].atEnd() && mLevels[i].at.key() <= passed)
@@ -42,6 +43,7 @@ TagMap::iterator& TagMap::iterator::operator++()
 
 bool TagMap::iterator::operator==(const iterator& other) const
 {
+    // The end has no levels, so that making one costs nothing; it equals every walk that is over.
     if (atEnd() || other.atEnd())
         return atEnd() && other.atEnd();
     return mLevels[mCurrent].at == other.mLevels[other.mCurrent].at;

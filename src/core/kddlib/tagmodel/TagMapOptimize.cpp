@@ -69,6 +69,7 @@ public:
                 __builtin_prefetch(held[i + kLookAhead]->value().constData());
             add(*held[i]);
         }
+        // What children inherit costs nothing where it stands, but would have to be held by each if it went.
         const int inheriting = children - static_cast<int>(held.size());
         mAbsent = mMissing + (shown == nullptr ? inheriting : 0);
         if (shown == nullptr)
@@ -83,7 +84,8 @@ public:
     bool isMissing() const { return mMissing > 0; }
     bool seesNothing() const { return mCosts.empty(); }
 
-    /// The value that costs the children most; there has to be one.
+    /// The value that costs the children most; there has to be one. Of several the first by a fixed order, because the
+    /// table has none and a study must be written to the same bytes every time.
     const TagElement& best() const
     {
         auto best = mCosts.cbegin();
@@ -238,6 +240,7 @@ void TagMap::storeOptionA(const DcmTagKey& keyGiven)
         deleteElement(key);
         return;
     }
+    // The marker may keep its bytes, which no reader asks for; items would be written with it.
     TagElement* own = ownElement(key);
     if (own != nullptr && !own->isSequence())
         own->setVr(VrCode::Missing);
@@ -295,7 +298,8 @@ void TagMap::removeTagsNotNeededByClient()
     TagElement* original = ownElement(DCM_OriginalAttributesSequence);
     if (original != nullptr && original->isSequence())
         static_cast<TagSequence*>(original)->truncate(kOriginalAttributesKept);
-    forgetVolumeSuffixes();
+    if (mVolumes != nullptr)
+        mVolumes->forgetFileSuffixes();
     for (TagMap* child : qAsConst(mChildren))
         child->removeTagsNotNeededByClient();
 }

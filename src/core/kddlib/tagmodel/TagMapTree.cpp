@@ -40,7 +40,7 @@ TagSequence* asSequence(TagElement* element)
 TagMap::TagMap(const TagMap& other)
     : mParent(other.mParent)
     , mChildren(other.mChildren)
-    , mVolumes(other.mVolumes)
+    , mVolumes(other.mVolumes != nullptr ? other.mVolumes->share() : nullptr)
     , mTags(other.mTags)
     , mIsSequenceItem(other.mIsSequenceItem)
     , mIsTakenOut(true)
@@ -50,9 +50,10 @@ TagMap::TagMap(const TagMap& other)
 
 TagMap& TagMap::operator=(const TagMap& other)
 {
-    // A copy that is assigned back brings what is here; that stays with whom it belongs to.
-    const bool isEmpty = mTags.isEmpty() && mChildren.isEmpty() && mVolumes.isEmpty();
-    if (!isEmpty && mTags == other.mTags && mChildren == other.mChildren && mVolumes == other.mVolumes)
+    // A copy that is assigned back brings what is here; that stays with whom it belongs to. It is told by what it holds
+    // and not by where it stands, because the copy of a copy brings the same.
+    const bool isEmpty = mTags.isEmpty() && mChildren.isEmpty() && volumes().isEmpty();
+    if (!isEmpty && mTags == other.mTags && mChildren == other.mChildren && volumes() == other.volumes())
         return *this;
     if (this == &other)
         return *this;
@@ -60,7 +61,7 @@ TagMap& TagMap::operator=(const TagMap& other)
         releaseAll();
     mParent = other.mParent;
     mChildren = other.mChildren;
-    mVolumes = other.mVolumes;
+    mVolumes = other.mVolumes != nullptr ? other.mVolumes->share() : nullptr;
     mTags = other.mTags;
     mIsSequenceItem = other.mIsSequenceItem;
     mIsTakenOut = true;
@@ -83,6 +84,7 @@ void TagMap::releaseAll()
     const QList<TagMap*> children = mChildren;
     for (TagMap* child : children) {
         if (mIsSequenceItem) {
+            // Items below an item belong to sequences of their own, which still show them.
             child->standAlone();
         } else {
             child->mParent = nullptr;
@@ -158,6 +160,7 @@ void TagMap::addChildMap(TagMap* child, Level level)
             return;
         child->standAlone();
     }
+    // The UID is taken out first: the node above has one of another image, or must not receive this one's.
     TagElement* uid = child->removeUID(level);
     if (mChildren.isEmpty() && !mIsSequenceItem)
         adoptFrom(child);
@@ -169,7 +172,8 @@ void TagMap::addChildMap(TagMap* child, Level level)
     child->mIsTakenOut = false;
 }
 
-/// An item below another item stays there and inherits; a node that others own can only be had whole.
+/// An item below another item stays there and inherits; a node that others own can only be had whole. Only one sequence
+/// deletes an item, so a second one gets a copy.
 TagMap* TagMap::becomeItem()
 {
     if (mIsInSequence)
@@ -192,6 +196,7 @@ void TagMap::adoptFrom(TagMap* child)
         dropWhatParentShows(*mParent);
 }
 
+/// Both sides are walked once, in key order: looking each key up would cost a walk up the tree for every one.
 void TagMap::dropWhatParentShows(const TagMap& parent)
 {
     auto own = mTags.begin();
@@ -272,6 +277,7 @@ void TagMap::standAlone()
         const bool isOwn = ownElement(it.key()) == it.value();
         all.insert(all.cend(), it.key(), isOwn ? it.value() : it.value()->clone());
     }
+    // The view shows no markers, so they are in nobody's hands; without a parent they have nothing to hide.
     for (TagElement* element : qAsConst(mTags)) {
         if (element->markedAsMissing())
             delete element;
@@ -298,6 +304,7 @@ void TagMap::relinkOwnItems()
             TagMap* item = sequence->item(i);
             if (item == nullptr)
                 continue;
+            // Before what is nested in it: where nested items hang is decided by what this one shows.
             item->hangBelow(above != nullptr && i < above->numItems() ? above->item(i) : nullptr);
             item->relinkOwnItems();
         }

@@ -236,6 +236,7 @@ QVector<StackFrame> stackFramesOf(const TagMap& image, QVector<LeftOutFrame>& le
         return {};
     }
 
+    // Read once for all: a frame's own part takes a look-up in nested items, and there may be thousands.
     QVector<StackFrame> frames;
     StackFrame common(image);
     common.imageUID = uid;

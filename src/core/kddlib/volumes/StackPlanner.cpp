@@ -16,6 +16,7 @@ namespace Kdd
 namespace
 {
 
+// Cosines are often written with three digits, spacings with four.
 constexpr double kSameDirection = 2e-3;
 constexpr double kSameSpacing = 1e-3;
 // Positions rounded to a tenth make steps that differ by a tenth.
@@ -120,6 +121,7 @@ Vec3d meanStep(const StackFrames& run)
     return (run.last()->position - run.first()->position) * (1.0 / (run.size() - 1));
 }
 
+/// Never more than a quarter of the step: of thin slices one may be missing without being farther off than a tenth.
 double toleranceFor(const Vec3d& step)
 {
     return qMin(kStepTolerance, length(step) / 4);
@@ -204,6 +206,7 @@ Stack stackOf(const StackFrames& run)
     for (const StackFrame* frame : run)
         stack.slices.append(*frame);
     stack.dims = {first.columns, first.rows, run.size()};
+    // Along the normal: with a tilted gantry the steps are longer than the slices are apart.
     stack.sliceSpacing = dot(z, first.normal());
     stack.transformation = matrixOf(x, y, z, first.position);
     Box3f& box = stack.boundingBox;

@@ -15,6 +15,7 @@ namespace Kdd
 namespace
 {
 
+// Far below the thinnest slices, and above what rounding makes of one position written twice.
 constexpr double kSamePlane = 0.01;  // [mm]
 
 /// An attribute by which the images of one plane may differ, and the functional group that enhanced images keep it in.

@@ -175,7 +175,7 @@ void Volume::closeGaps() const
     mSlices = SliceList(slices);
 }
 
-/// Its slices stay, with an unknown image.
+/// Its slices stay, with an unknown image: a viewer must not show another image in their place.
 void Volume::forgetImage(int i)
 {
     QVector<TagMap*> left = mImages.list();
@@ -317,6 +317,7 @@ void Volume::setMultiFrameInfo(const std::vector<std::string>& frameIdentifiers)
         for (int i = 0; i < order.size(); ++i)
             slices[order.at(i).position].image = i;
     }
+    // Of several images of one UID the last answers.
     QHash<QByteArray, int> indexes;
     for (int i = 0; i < order.size(); ++i)
         indexes.insert(order.at(i).sopUID, i);

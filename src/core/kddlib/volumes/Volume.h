@@ -1,6 +1,6 @@
 #pragma once
 
-#include "kddlib/volumes/VolumeImages.h"
+#include "kddlib/tagmodel/VolumeImages.h"
 #include "platform/base/Export.h"
 #include "platform/base/Geometry.h"
 #include "platform/volume/KxHistogram.h"

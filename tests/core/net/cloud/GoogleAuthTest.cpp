@@ -3,7 +3,7 @@
 #include "kddlib/net/cloud/KxGoogleAuth.h"
 #include "kddlib/net/http/KxHttpStatus.h"
 #include "support/CloudStore.h"
-#include "support/Files.h"
+#include "support/FileContent.h"
 #include "support/LogCapture.h"
 #include "support/ObjectServer.h"
 #include "support/Setting.h"
@@ -62,7 +62,7 @@ public:
 
     void save(const char* name, const QByteArray& content) const
     {
-        writeFile(mFolder.filePath(QLatin1String(name)), content);
+        putFile(mFolder.filePath(QLatin1String(name)), content);
     }
 
 private:
@@ -216,7 +216,7 @@ TEST_F(GoogleAuth, ReadsTheKeyFromTheFileThatTheEnvironmentNames)
     Setting variable("GOOGLE_APPLICATION_CREDENTIALS", "");
     for (const auto& one : kCases) {
         const LogCapture log;
-        writeFile(file.fileName(), one.content);
+        putFile(file.fileName(), one.content);
         variable.set(one.variable);
         EXPECT_EQ(header().isEmpty(), !one.message.empty()) << one.message;
         EXPECT_EQ(log.count(one.message), int(log.lines().size())) << testing::PrintToString(log.lines());

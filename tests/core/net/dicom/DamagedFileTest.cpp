@@ -2,7 +2,7 @@
 
 #include "kddlib/net/dicom/DicomFileReader.h"
 #include "support/DatasetBuilder.h"
-#include "support/Files.h"
+#include "support/FileContent.h"
 
 #include <QTemporaryDir>
 
@@ -33,7 +33,7 @@ QByteArray soundFile(E_EncodingType lengths = EET_UndefinedLength)
     EXPECT_TRUE(
         file.saveFile(path.toLocal8Bit().constData(), EXS_LittleEndianExplicit, lengths, EGL_withoutGL)
             .good());
-    return contentOf(path);
+    return fileContent(path);
 }
 
 QByteArray declaredAsRle(QByteArray file)
@@ -89,7 +89,7 @@ protected:
     QByteArray put(const QByteArray& content) const
     {
         const QString path = mFolder.filePath(QStringLiteral("file"));
-        writeFile(path, content);
+        putFile(path, content);
         return path.toLocal8Bit();
     }
 

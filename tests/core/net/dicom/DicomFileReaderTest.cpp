@@ -4,7 +4,7 @@
 #include "kddlib/net/dicom/KxDcmFileLoader.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/tagmodel/TagSequence.h"
-#include "support/Files.h"
+#include "support/FileContent.h"
 #include "support/LogCapture.h"
 
 #include <QTemporaryDir>
@@ -117,7 +117,7 @@ protected:
     OFCondition read(const QByteArray& bytes)
     {
         const QString path = mFolder.filePath(QStringLiteral("file"));
-        writeFile(path, bytes);
+        putFile(path, bytes);
         return readDicomFile(path.toLocal8Bit().constData(), file);
     }
 

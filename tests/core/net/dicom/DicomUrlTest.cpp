@@ -4,7 +4,7 @@
 #include "kddlib/net/dicom/DcmInputHttpStream.h"
 #include "kddlib/net/dicom/KxDcmFileLoader.h"
 #include "support/DatasetBuilder.h"
-#include "support/Files.h"
+#include "support/FileContent.h"
 #include "support/HttpServer.h"
 #include "support/LogCapture.h"
 #include "support/RealFiles.h"
@@ -52,7 +52,7 @@ protected:
     {
         DcmFileFormat format(&image.dataset());
         format.saveFile(path().c_str(), EXS_LittleEndianExplicit);
-        bytes = contentOf(QString::fromStdString(path()));
+        bytes = fileContent(QString::fromStdString(path()));
     }
     ~DicomUrl() override
     {
@@ -229,7 +229,7 @@ TEST(RealFilesByUrl, AreReadAsFromTheirPaths)
         [&](const QByteArray&) -> ScriptedServer::Reply { return {httpResponse(content)}; });
     for (const char* subfolder : {"transfer-syntaxes", "modalities", "odd"}) {
         for (const QString& path : realFiles(subfolder)) {
-            content = contentOf(path);
+            content = fileContent(path);
             if (content.size() > 20'000'000)
                 continue;
             EXPECT_EQ(load(server.url("x"), Mode::Default), load(path.toStdString(), Mode::Default))

@@ -269,8 +269,8 @@ void TagMap::serializeVolumes(KxMsg& out, QList<QByteArray>& blobs) const
         return;
     }
     KxMsg list;
-    writeLength(list, mVolumes.size());
-    for (const Volume* volume : mVolumes) {
+    writeLength(list, volumes().size());
+    for (const Volume* volume : volumes()) {
         volume->serialize(list, blobs);
         if (list.size() > kMaxBodySize) {
             out.setFailed();
@@ -292,14 +292,15 @@ void TagMap::deserializeVolumes(KxMsg& in, const QList<QByteArray>& blobs)
     QVector<VolumeShare> shares;
     // Every list goes through all the images, so a series has one; a file of nothing but lists would take
     // forever.
-    if (!mVolumes.isEmpty() || !shareImages(*this, haveSlices, shares)) {
+    if (!this->volumes().isEmpty() || !shareImages(*this, haveSlices, shares)) {
         in.setFailed();
         return;
     }
+    QList<Volume*>& held = obtainVolumes();
     for (std::unique_ptr<Volume>& volume : volumes) {
-        const VolumeShare& share = shares.at(mVolumes.size());
+        const VolumeShare& share = shares.at(held.size());
         volume->attachImages(share.index, share.images);
-        mVolumes.append(volume.release());
+        held.append(volume.release());
     }
 }
 

@@ -75,17 +75,20 @@ Result VolumeSettling::settle(TagMap& series)
         return volume->arrangeLike(share.images);
     };
     releaseImagesOfOthers(series);
-    for (int i = series.mVolumes.size() - 1; i >= 0; --i) {
-        const Volume* volume = series.mVolumes.at(i);
+    if (series.volumes().isEmpty())
+        return {};
+    QList<Volume*>& volumes = series.obtainVolumes();
+    for (int i = volumes.size() - 1; i >= 0; --i) {
+        const Volume* volume = volumes.at(i);
         if (!hasLostItsImages(*volume))
             continue;
         LogFile::printf("Volume %d of series %s goes: it has lost its last image", volume->volumeIndex(),
                         series.uid(TagMap::SeriesLevel).constData());
-        delete series.mVolumes.takeAt(i);
+        delete volumes.takeAt(i);
     }
-    if (series.mVolumes.isEmpty() || areFoundByReader(series, arrange))
+    if (volumes.isEmpty() || areFoundByReader(series, arrange))
         return {};
-    std::stable_sort(series.mVolumes.begin(), series.mVolumes.end(), isBefore);
+    std::stable_sort(volumes.begin(), volumes.end(), isBefore);
     nameVolumes(series);
     if (areFoundByReader(series, arrange))
         return {};
@@ -95,14 +98,15 @@ Result VolumeSettling::settle(TagMap& series)
         return {};
     return Result::failure(QStringLiteral("the images of series %1 cannot tell its %2 volumes apart")
                                .arg(QString::fromLatin1(series.uid(TagMap::SeriesLevel)))
-                               .arg(series.mVolumes.size()));
+                               .arg(volumes.size()));
 }
 
 /// Indexes are places. An image of several volumes has a byte for each, so these get the first places; those for which
 /// no byte is left are read from their files.
 void VolumeSettling::renumber(TagMap& series)
 {
-    const QHash<const TagMap*, int> counts = countVolumes(series.mVolumes);
+    QList<Volume*>& volumes = series.obtainVolumes();
+    const QHash<const TagMap*, int> counts = countVolumes(volumes);
     const auto sharesImages = [&](const Volume* volume) {
         for (int i = 0; i < volume->numImages(); ++i) {
             if (counts.value(volume->image(i)) > 1)
@@ -110,19 +114,19 @@ void VolumeSettling::renumber(TagMap& series)
         }
         return false;
     };
-    if (series.mVolumes.size() > kVolumesToldApart)
-        std::stable_partition(series.mVolumes.begin(), series.mVolumes.end(), sharesImages);
-    for (int i = series.mVolumes.size() - 1; i >= kVolumesToldApart; --i) {
-        const Volume* volume = series.mVolumes.at(i);
+    if (volumes.size() > kVolumesToldApart)
+        std::stable_partition(volumes.begin(), volumes.end(), sharesImages);
+    for (int i = volumes.size() - 1; i >= kVolumesToldApart; --i) {
+        const Volume* volume = volumes.at(i);
         if (!sharesImages(volume))
             continue;
         LogFile::errorf("Volume %s of series %s is left out of the tag file: more than %d share their images",
                         volume->fileNameSuffix().constData(), series.uid(TagMap::SeriesLevel).constData(),
                         kVolumesToldApart);
-        delete series.mVolumes.takeAt(i);
+        delete volumes.takeAt(i);
     }
-    for (int i = 0; i < series.mVolumes.size(); ++i)
-        series.mVolumes.at(i)->mVolumeIndex = i;
+    for (int i = 0; i < volumes.size(); ++i)
+        volumes.at(i)->mVolumeIndex = i;
 }
 
 }  // namespace Kdd

@@ -1,4 +1,4 @@
-#include "kddlib/volumes/VolumeImages.h"
+#include "kddlib/tagmodel/VolumeImages.h"
 
 #include "kddlib/tagmodel/TagMap.h"
 
@@ -27,7 +27,8 @@ VolumeImages::~VolumeImages()
 
 void VolumeImages::set(const QVector<TagMap*>& images)
 {
-    const QVector<TagMap*> kept = images;  // which may be this list
+    const QVector<TagMap*> kept =
+        images;  // which may be this list, whose images release() has to find unchanged
     release();
     mImages = kept;
     mHasGaps = kept.contains(nullptr);

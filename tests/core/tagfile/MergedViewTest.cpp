@@ -1,7 +1,6 @@
 #include "kddlib/tagfile/TagFile.h"
 #include "kddlib/tagmodel/TagMap.h"
-#include "kddlib/tagmodel/TagSequence.h"
-#include "support/DatasetBuilder.h"
+#include "support/RandomImages.h"
 #include "support/TemporaryStore.h"
 #include "support/TreeText.h"
 
@@ -10,100 +9,11 @@
 #include <gtest/gtest.h>
 
 #include <map>
-#include <random>
 
 using namespace Kdd;
 
 namespace
 {
-
-constexpr unsigned int kBound = 64;
-constexpr int kDepth = 3;
-
-// Graphic Data has a larger bound, the preview a table of its own, and a value may come where a sequence stood.
-const DcmTagKey kValueKeys[] = {
-    DCM_StudyDescription, DCM_SmallestImagePixelValue, DCM_GraphicData, {0x0009, 0x1001}};
-const DcmTagKey kSequenceKeys[] = {
-    DCM_ReferencedImageSequence, DCM_RequestAttributesSequence, {0x0009, 0x1002}};
-const DcmTagKey kPreview(0x0006, 0x7105);
-
-/// Images of one study that share much and differ in all that can differ: each is made from the one before.
-class RandomImages
-{
-public:
-    explicit RandomImages(unsigned int seed)
-        : mRandom(seed)
-    {
-    }
-
-    int below(int count) { return static_cast<int>(mRandom() % static_cast<unsigned int>(count)); }
-    bool oneIn(int count) { return below(count) == 0; }
-    DcmTagKey key() { return oneIn(3) ? kSequenceKeys[below(3)] : kValueKeys[below(4)]; }
-
-    TagMap* next(const QByteArray& sopUID)
-    {
-        change(mLast.dataset(), 0);
-        mLast.with(DCM_SOPInstanceUID, sopUID.constData()).inSeries(oneIn(2) ? "1.2.3" : "1.2.4");
-        TagMap* map = mLast.map(kBound);
-        if (oneIn(3))
-            map->putAndInsertValue(kPreview, VrCode::OB, QByteArray(below(3), 'j'));
-        return map;
-    }
-
-private:
-    DcmElement* value(const DcmTagKey& key)
-    {
-        const VrCode vrs[] = {VrCode::LO, VrCode::LT, VrCode::US, VrCode::SS, VrCode::OB, VrCode::UN};
-        const QByteArray values[] = {"", "AB", "AC", "ABCD", QByteArray(70, 'o'), QByteArray(65536, 'l')};
-        const VrCode vr = vrs[below(6)];
-        return TagElement(vr, values[below(6)]).newDcmElement(DcmTag(key, evrOf(vr))).release();
-    }
-
-    void change(DcmItem& item, int depth)
-    {
-        for (const DcmTagKey& key : kValueKeys)
-            changeValue(item, key);
-        for (const DcmTagKey& key : kSequenceKeys)
-            changeSequence(item, key, depth);
-    }
-
-    void changeValue(DcmItem& item, const DcmTagKey& key)
-    {
-        const int choice = below(8);
-        if (choice == 0)
-            delete item.remove(key);
-        else if (choice == 1)
-            item.insert(value(key), OFTrue);
-    }
-
-    void changeSequence(DcmItem& item, const DcmTagKey& key, int depth)
-    {
-        const int choice = below(10);
-        DcmSequenceOfItems* sequence = nullptr;
-        item.findAndGetSequence(key, sequence);
-        if (choice == 0)
-            changeValue(item, key);
-        else if (sequence == nullptr && choice < 4)
-            item.insert(new DcmSequenceOfItems(DcmTag(key, EVR_SQ)), OFTrue);
-        else if (sequence != nullptr && choice < 7 && depth < kDepth)
-            changeItems(*sequence, depth);
-    }
-
-    void changeItems(DcmSequenceOfItems& sequence, int depth)
-    {
-        if (sequence.card() > 2 || (sequence.card() > 0 && oneIn(6)))
-            delete sequence.remove(sequence.card() - 1);
-        else if (sequence.card() == 0 || oneIn(3))
-            sequence.append(new DcmItem);
-        for (unsigned long i = 0; i < sequence.card(); ++i) {
-            if (oneIn(2))
-                change(*sequence.getItem(i), depth + 1);
-        }
-    }
-
-    std::mt19937 mRandom;
-    DatasetBuilder mLast = anImage();
-};
 
 /// A tag file, and beside it what each of its images showed when it stood alone.
 class MergedView : public testing::TestWithParam<unsigned int>
@@ -118,7 +28,7 @@ protected:
         const Step steps[] = {&MergedView::add,      &MergedView::add,          &MergedView::take,
                               &MergedView::remove,   &MergedView::emptySeries,  &MergedView::merge,
                               &MergedView::optimize, &MergedView::writeAndRead, &MergedView::rearrange};
-        (this->*steps[mRandom.below(std::size(steps))])();
+        (this->*steps[mRandom.below(int(std::size(steps)))])();
     }
 
     void expectUnchanged() const
@@ -253,6 +163,6 @@ TEST_P(MergedView, OfEveryImageStaysWhateverHappensAroundIt)
     }
 }
 
-INSTANTIATE_TEST_SUITE_P(Seeds, MergedView, testing::Range(1U, 21U));
+INSTANTIATE_TEST_SUITE_P(Seeds, MergedView, testing::Range(1U, 13U));
 
 }  // namespace

@@ -1,26 +1,21 @@
 #include "kddlib/tagmodel/TagMap.h"
-#include "kddlib/volumes/Volume.h"
-#include "kddlib/volumes/VolumeImages.h"
+#include "kddlib/tagmodel/VolumeImages.h"
 
 namespace Kdd
 {
 
-void TagMap::addBareVolume(Volume* volume)
+const QList<Volume*>& TagMap::volumes() const
 {
-    if (mVolumes.contains(volume))
-        return;
-    mVolumes.append(volume);
-    if (volume->mVolumeIndex < 0)
-        volume->mVolumeIndex = mVolumes.size();
+    static const QList<Volume*> none;
+    return mVolumes != nullptr ? mVolumes->list() : none;
 }
 
 void TagMap::clearVolumes()
 {
-    if (mOwns)
-        qDeleteAll(mVolumes);
-    mVolumes.clear();
+    mVolumes.reset();
 }
 
+/// At once, because a volume is asked for its images long after one of them has gone.
 void TagMap::leaveVolumes()
 {
     for (const VolumePlace& each : qAsConst(mVolumePlaces))
@@ -35,12 +30,6 @@ void TagMap::takeVolumePlaces(TagMap& former)
         mVolumePlaces.append(each);
     }
     former.mVolumePlaces.clear();
-}
-
-void TagMap::forgetVolumeSuffixes()
-{
-    for (Volume* volume : qAsConst(mVolumes))
-        volume->setFileNameSuffix(QByteArray());
 }
 
 }  // namespace Kdd
