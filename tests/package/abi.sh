@@ -4,11 +4,13 @@
 set -euo pipefail
 what=$1 library=$2 headers=$3 record=$4
 
+# Only what a program sees, and nothing of where and how it was built, so that a record changes with that alone.
+seen=(--exported-interfaces-only --drop-private-types --no-architecture --no-show-locs)
+
 case $what in
     record)
-        # Nothing of where and how it was built: only what a program sees, so that a record changes with that alone.
-        abidw --headers-dir "$headers" --drop-private-types --no-corpus-path --no-comp-dir-path --no-show-locs \
-            --no-architecture --no-elf-needed --type-id-style hash "$library" | xz -9e >"$record.new"
+        abidw --headers-dir "$headers" "${seen[@]}" --no-corpus-path --no-comp-dir-path --no-elf-needed \
+            --type-id-style hash "$library" | xz -9e >"$record.new"
         mv "$record.new" "$record"
         ;;
     check)
@@ -16,7 +18,7 @@ case $what in
         trap 'rm -f "$former"' EXIT
         xz -dc "$record" >"$former"
         # What is added does no harm.
-        abidiff --no-architecture --headers-dir2 "$headers" --drop-private-types --no-added-syms --no-show-locs "$former" "$library" || {
+        abidiff --headers-dir2 "$headers" "${seen[@]}" --no-added-syms "$former" "$library" || {
             cat >&2 <<TXT
 
 Programs built against the recorded library would not run with this one as they did: see above what was removed or

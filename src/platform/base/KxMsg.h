@@ -16,7 +16,8 @@ namespace Kdd
 /// 32-bit integers, `Box3f` six floats (xmin, xmax, ymin, ymax, zmin, zmax), `Mat4f` sixteen floats row by row.
 ///
 /// Reading past the end gives zeros, takes nothing and leaves the message failed for good, so a reader may take a
-/// whole record and look at `failed()` once. Nothing throws and no byte outside the message is touched.
+/// whole record and look at `failed()` once. Nothing throws and no byte outside the message is touched. A value; each
+/// thread uses one of its own.
 class KDD_EXPORT KxMsg
 {
 public:

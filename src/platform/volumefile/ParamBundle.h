@@ -9,7 +9,7 @@
 namespace Kdd
 {
 
-/// A named value of a volume file: a text, or numbers.
+/// A named value of a volume file: a text, or numbers. Each thread uses a copy of its own.
 struct KDD_EXPORT Parameter
 {
     enum class Kind { Text, Integers, Reals };

@@ -1,6 +1,7 @@
 #include "kddlib/tagfile/StudyRecord.h"
 
 #include "kddlib/items/TextDecoding.h"
+#include "kddlib/tagfile/SeriesRecord.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/os/JournaledWrite.h"

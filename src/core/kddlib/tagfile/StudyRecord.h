@@ -3,7 +3,6 @@
 #include "platform/base/Export.h"
 #include "platform/database/Catalogue.h"
 
-#include <QMap>
 #include <QString>
 
 namespace Kdd
@@ -21,9 +20,6 @@ KDD_EXPORT Kxg::DicomFileRecord fileRecord(const TagMap& image, const QByteArray
 /// What it keeps of a study whose tag file was written: by what that is recognised, and what each series shows of
 /// itself. A series is described by its first image by path, the study by the first of all.
 KDD_EXPORT Kxg::BuiltStudy builtStudy(const TagFile& file);
-
-/// The same of a study by its series and the stamp of its file.
-Kxg::BuiltStudy builtStudy(const QMap<QByteArray, TagMap*>& series, const Kxg::TagFileStamp& stamp);
 
 /// Whether the tag file at the path is the one of that stamp. False when it is absent, was written by others since, or
 /// when a write of it did not come to its end.

@@ -6,6 +6,7 @@
 #include "kddlib/tagfile/DatabaseSync.h"
 #include "kddlib/tagfile/DatabaseValues.h"
 #include "kddlib/tagfile/SeriesLabels.h"
+#include "kddlib/tagfile/SeriesRecord.h"
 #include "kddlib/tagfile/StoredStudy.h"
 #include "kddlib/tagfile/StudyPreviews.h"
 #include "kddlib/tagfile/StudyRecord.h"

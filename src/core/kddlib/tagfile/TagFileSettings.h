@@ -9,7 +9,7 @@
 namespace Kdd
 {
 
-/// What holds for all tag files of the process, made once at start and not locked. Programs set and ask it by way of
+/// What holds for all tag files of the process, made once at start, before there are several threads, and not locked. Programs set and ask it by way of
 /// `TagFile`; it stands apart because the parts that a tag file is made of go by it, too.
 class KDD_EXPORT TagFileSettings
 {

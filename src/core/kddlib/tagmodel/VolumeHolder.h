@@ -14,7 +14,8 @@ class Volume;
 /// The volumes that hang below a node, as far as the tree has to do with them: they go with the node, and lose their
 /// suffixes with what else clients do not need. What a volume is only the room above knows, so it makes the holders.
 ///
-/// A node without volumes has no holder, as nearly all nodes are images.
+/// A node without volumes has no holder, as nearly all nodes are images. Used by one thread at a time, with the whole
+/// tree.
 class KDD_EXPORT VolumeHolder
 {
 public:

@@ -16,7 +16,7 @@ class TagMap;
 /// The attributes of one frame of an image, wherever the image keeps them: enhanced images have functional groups, one
 /// set for each frame and one that all frames share; any other image has the attributes itself.
 ///
-/// Points into the image, which must outlive it and stay unchanged.
+/// Points into the image, which must outlive it and stay unchanged. Used by one thread at a time, with the whole tree.
 class KDD_EXPORT FrameTags
 {
 public:

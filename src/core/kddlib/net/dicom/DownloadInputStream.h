@@ -11,7 +11,7 @@ namespace Kdd
 {
 
 /// An object of the network as DCMTK's parser reads it, wherever its bytes come from. Values cannot be left where they
-/// are to be read later: the parser has to be told to read all of them.
+/// are to be read later: the parser has to be told to read all of them. Used by one thread at a time.
 class KDD_EXPORT DownloadInputStream : public DcmInputStream
 {
 public:

@@ -1,5 +1,6 @@
 #include "kddlib/tagfile/qa/QARecord.h"
 
+#include "kddlib/tagfile/SeriesRecord.h"
 #include "kddlib/tagfile/StudyRecord.h"
 #include "kddlib/tagfile/StudyTree.h"
 #include "kddlib/tagfile/TagFileSettings.h"
