@@ -13,7 +13,8 @@ if(KDD_SANITIZE)
   target_link_options(kdd_options INTERFACE -fsanitize=${KDD_SANITIZE})
   if(CMAKE_CXX_COMPILER_ID MATCHES "Clang")
     # Clang leaves the sanitizers' run time to the program that loads a shared library.
-    target_link_options(kdd_options INTERFACE $<$<IN_LIST:$<TARGET_PROPERTY:TYPE>,SHARED_LIBRARY$<SEMICOLON>MODULE_LIBRARY>:-Wl,-z,undefs>)
+    target_link_options(kdd_options INTERFACE
+      $<$<IN_LIST:$<TARGET_PROPERTY:TYPE>,SHARED_LIBRARY$<SEMICOLON>MODULE_LIBRARY>:-Wl,-z,undefs>)
   endif()
 endif()
 if(KDD_FUZZ)

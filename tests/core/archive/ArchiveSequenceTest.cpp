@@ -252,6 +252,15 @@ TEST_F(FixedSequence, AnEditLeavesAnImageInTheSeriesOfItsFile)
     expectHealed();
 }
 
+TEST_F(FixedSequence, ASyncFollowsAFileIntoASeriesThatIsNotBuilt)
+{
+    at("9", {"1.1", "1.1.7", "9.1", "Doe^1", "1"});
+    index(root());
+    sync("1.1");
+    expectAgreement();
+    expectHealed();
+}
+
 TEST_F(FixedSequence, ASyncedOldTagFileWaitsToBeBuilt)
 {
     keepCopy("1.1");

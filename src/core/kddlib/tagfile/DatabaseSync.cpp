@@ -139,6 +139,21 @@ private:
     QSet<const TagMap*> mKnown;
 };
 
+/// For a series that is not held: the newest file of an image that stands in another one may say that it belongs there.
+/// Until that file is taken the image keeps its place, and follows the file as within its own series.
+bool followFiles(const StudyTree& tree, const Kxg::DicomDirectoryEntry& entry)
+{
+    bool isChanged = false;
+    for (const Kxg::ImageFile& file : entry.seriesInfo != nullptr ? entry.seriesInfo->images : kNoImages) {
+        TagMap* image = DatabaseValues::findImage(tree, file);
+        if (image == nullptr || filePathOf(*image) == forwardSlashes(file.path))
+            continue;
+        DatabaseValues::setFilePath(*image, file);
+        isChanged = true;
+    }
+    return isChanged;
+}
+
 /// Whether a path or a volume's name changed.
 bool syncSeries(StudyTree& tree, TagMap& series, const Kxg::DicomDirectoryEntry& entry)
 {
@@ -239,10 +254,12 @@ bool syncWithDatabase(StudyTree& tree, const std::shared_ptr<Kxg::DicomDirectory
     const DatabaseView view(tree, *study);
     bool isChanged = false;
     for (const Kxg::DicomDirectoryEntry& entry : study->entries) {
-        if (TagMap* series = tree.findSeries(entry.seriesInstanceUID))
+        if (TagMap* series = tree.findSeries(entry.seriesInstanceUID)) {
             isChanged = syncSeries(tree, *series, entry) || isChanged;
-        else
+        } else {
             LogFile::warnf("Series %s not found in tag map", entry.seriesInstanceUID.constData());
+            isChanged = followFiles(tree, entry) || isChanged;
+        }
     }
     isChanged = removeUnlisted(tree, view) || isChanged;
     const int series = tree.series().size();

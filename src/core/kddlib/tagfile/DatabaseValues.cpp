@@ -83,10 +83,15 @@ int DatabaseValues::addFilePaths(TagMap* series, const Kxg::SeriesInfo* info, bo
             complete = false;
             continue;
         }
-        image->putAndInsertValue(kFilePath, VrCode::LO, forwardSlashes(file.path));
+        setFilePath(*image, file);
         ++count;
     }
     return count;
+}
+
+void DatabaseValues::setFilePath(TagMap& image, const Kxg::ImageFile& file)
+{
+    image.putAndInsertValue(kFilePath, VrCode::LO, forwardSlashes(file.path));
 }
 
 TagMap* DatabaseValues::makeImage(TagMap* series, const Kxg::ImageFile& file)

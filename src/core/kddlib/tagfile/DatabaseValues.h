@@ -28,6 +28,9 @@ public:
     /// Null when the tree does not hold it.
     static TagMap* findImage(const StudyTree& tree, const Kxg::ImageFile& file);
 
+    /// Gives an image the path that the database has of its file.
+    static void setFilePath(TagMap& image, const Kxg::ImageFile& file);
+
     /// Gives every image that `info` names its file path. Images not held are warned about, and `complete` becomes
     /// false, or are made with `createMissing`. How many images received a path.
     int addFilePaths(TagMap* series, const Kxg::SeriesInfo* info, bool createMissing, bool& complete);
