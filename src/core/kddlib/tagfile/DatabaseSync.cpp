@@ -139,8 +139,8 @@ private:
     QSet<const TagMap*> mKnown;
 };
 
-/// For a series that is not held: the newest file of an image that stands in another one may say that it belongs there.
-/// Until that file is taken the image keeps its place, and follows the file as within its own series.
+/// Whether the path of an image changed. The series need not be held: the newest file of an image that stands in another
+/// one may say that it belongs there. Until that file is taken the image keeps its place, and follows the file.
 bool followFiles(const StudyTree& tree, const Kxg::DicomDirectoryEntry& entry)
 {
     bool isChanged = false;
@@ -157,11 +157,8 @@ bool followFiles(const StudyTree& tree, const Kxg::DicomDirectoryEntry& entry)
 /// Whether a path or a volume's name changed.
 bool syncSeries(StudyTree& tree, TagMap& series, const Kxg::DicomDirectoryEntry& entry)
 {
-    bool isChanged = false;
-    for (const Kxg::ImageFile& file : entry.seriesInfo != nullptr ? entry.seriesInfo->images : kNoImages) {
-        const TagMap* image = DatabaseValues::findImage(tree, file);
-        isChanged = isChanged || (image != nullptr && filePathOf(*image) != forwardSlashes(file.path));
-    }
+    const bool isChanged = followFiles(tree, entry);
+    // The images have their paths; what is listed and not held is warned about.
     bool complete = true;
     DatabaseValues(tree).addFilePaths(&series, entry.seriesInfo.get(), false, complete);
     const QVector<QByteArray> names = volumeNames(series);
