@@ -1,0 +1,22 @@
+#pragma once
+
+#include "server/dicomweb/ResourcePath.h"
+#include "server/http/Response.h"
+
+namespace Kdd::DicomWeb
+{
+
+/// What answers for one group of paths. Called on several threads at the same time.
+class Resource
+{
+public:
+    virtual ~Resource() = default;
+
+    /// Whether the path is this one's.
+    virtual bool owns(const ResourcePath& path) const = 0;
+
+    /// The answer to GET (and HEAD) on a path that is owned.
+    virtual Http::Response answer(const Http::Request& request, const ResourcePath& path) = 0;
+};
+
+}  // namespace Kdd::DicomWeb

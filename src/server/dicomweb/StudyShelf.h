@@ -1,0 +1,69 @@
+#pragma once
+
+#include <QByteArray>
+
+#include <kddlib/TagFile.h>
+
+#include <memory>
+#include <mutex>
+
+namespace Kdd::DicomWeb
+{
+
+/// A study's tag file as it was at one moment: never changed once it is here. Kept by whoever answers from it, also when
+/// the file has been replaced meanwhile.
+class ServedStudy
+{
+public:
+    ServedStudy(std::unique_ptr<TagFile> file, const QByteArray& version)
+        : mFile(std::move(file))
+        , mVersion(version)
+    {
+    }
+
+    /// Of the file's content, in letters that may stand in an ETag: two tag files of the same version answer alike.
+    const QByteArray& version() const { return mVersion; }
+
+    /// What `look(file)` gives. A tree is looked at by one thread at a time, so whoever sends to a slow client looks
+    /// again for each block and holds nothing between. Nothing of the tree may be changed or kept.
+    template <typename Look>
+    auto look(const Look& look) const
+    {
+        const std::lock_guard<std::mutex> lock(mMutex);
+        return look(static_cast<const TagFile&>(*mFile));
+    }
+
+private:
+    mutable std::mutex mMutex;
+    std::unique_ptr<TagFile> mFile;
+    QByteArray mVersion;
+};
+
+/// What became of a study that was looked up.
+enum class Presence {
+    Found,
+    Absent,   ///< there is no tag file
+    Held,     ///< others hold it longer than the site's patience; asking again makes sense
+    Damaged,  ///< told in the log
+};
+
+/// The tag files that were asked for last, read again as soon as they change. May be used on any thread.
+class StudyShelf
+{
+public:
+    /// `capacity` bounds what is kept by the tag files' uncompressed size [bytes]; the study looked up last always is.
+    explicit StudyShelf(qint64 capacity);
+    ~StudyShelf();
+
+    /// The study as its file is now.
+    Presence find(const QByteArray& studyUID, std::shared_ptr<const ServedStudy>& study);
+
+    /// The version alone, without reading the tree where the file was seen before.
+    Presence version(const QByteArray& studyUID, QByteArray& version);
+
+private:
+    struct Private;
+    std::unique_ptr<Private> d;
+};
+
+}  // namespace Kdd::DicomWeb

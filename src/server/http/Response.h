@@ -1,0 +1,60 @@
+#pragma once
+
+#include "server/http/OpenFile.h"
+#include "server/http/Request.h"
+
+#include <kddlib/Result.h>
+
+#include <memory>
+#include <variant>
+#include <vector>
+
+namespace Kdd::Http
+{
+
+/// Makes a body block by block, for whoever sends it as fast as the client takes it. Used by one thread at a time, not
+/// always the same.
+class Producer
+{
+public:
+    virtual ~Producer() = default;
+
+    /// Replaces `block` by the next bytes, some 64 KiB; empty at the end. After a failure the connection is closed
+    /// before the end of the body, so that the client sees that something is missing.
+    virtual Result next(QByteArray& block) = 0;
+};
+
+/// What an answer consists of, in this order. Its length is known unless there is a producer, and is then sent.
+using BodyPart = std::variant<QByteArray, FileRange, std::unique_ptr<Producer>>;
+
+struct Response
+{
+    int status = 200;
+    QVector<Field> headers;  ///< Content-Length, Transfer-Encoding, Connection and Date come from the session
+    std::vector<BodyPart> body;
+
+    Response() = default;
+    explicit Response(int code)
+        : status(code)
+    {
+    }
+
+    void addHeader(const char* name, const QByteArray& value) { headers.append({name, value}); }
+};
+
+/// A body that is there as a whole.
+Response textResponse(int status, const QByteArray& mediaType, const QByteArray& body);
+
+/// A failure in words for whoever sent the request: one line of plain text. No name of a file of the server belongs
+/// there.
+Response failure(int status, const QString& reason);
+
+/// Answers requests. Called on several threads at the same time. HEAD is answered like GET; the body stays behind.
+class Handler
+{
+public:
+    virtual ~Handler() = default;
+    virtual Response answer(const Request& request) = 0;
+};
+
+}  // namespace Kdd::Http
