@@ -30,6 +30,7 @@ struct Settings
     std::string droppedCategory;
 };
 
+/// Read without a lock, since all of it is set before there are several threads.
 Settings& settings()
 {
     static Settings instance;
@@ -92,12 +93,15 @@ spdlog::logger& logger()
                 sinks.push_back(std::make_shared<spdlog::sinks::rotating_file_sink_mt>(path, kRotatedSize,
                                                                                        kRotatedFiles));
             } catch (const spdlog::spdlog_ex& failure) {
+                // A log file that cannot be made is told on standard error. The work itself goes on.
                 fault = failure.what();
             }
         }
         auto made = std::make_shared<spdlog::logger>("kdd", sinks.begin(), sinks.end());
+        // Which lines are wanted is decided before they get here.
         made->set_level(spdlog::level::trace);
         made->set_pattern("%Y-%m-%d %H:%M:%S.%e %^%l%$ %v");
+        // What may be the last line before a crash is not held back.
         made->flush_on(spdlog::level::warn);
         if (!fault.empty())
             made->error("The log file cannot be written: {}", fault);
@@ -108,6 +112,7 @@ spdlog::logger& logger()
 
 std::string formatted(const char* format, va_list arguments)
 {
+    // A list of arguments can be walked once only, and is needed for the length and for the text.
     va_list again;
     va_copy(again, arguments);
     // NOLINTNEXTLINE(clang-analyzer-valist.Uninitialized): the caller has started the list

@@ -35,6 +35,7 @@ StudyFiles readFiles(SqlConnection& connection, int studyId)
     files.volumes = pathsOf(volumes);
     for (const ListedVolume& volume : volumes)
         files.withVolume.insert(volume.seriesInstanceUID.toStdString());
+    // The database orders by bytes and knows nothing of part numbers.
     std::sort(files.volumes.begin(), files.volumes.end(), Kdd::isEarlierPart);
     // Without files it is about to be forgotten.
     if (files.dicom.empty() && files.volumes.empty())
@@ -86,6 +87,7 @@ void readVolumes(SqlConnection& connection, qint64 studyId, DicomDirectoryEntry&
     for (const ListedVolume& volume : listVolumes(connection, studyId))
         if (DicomDirectoryEntry* series = bySeries.value(volume.seriesInstanceUID))
             series->entries.push_back(volumeEntry(*series, volume.path));
+    // Equal names in different folders keep the order of their paths.
     for (DicomDirectoryEntry& series : study.entries)
         std::stable_sort(series.entries.begin(), series.entries.end(),
                          [](const auto& a, const auto& b) { return Kdd::isEarlierPart(a.name, b.name); });
@@ -113,11 +115,13 @@ Kdd::Result GetCorrections(int studyId, QByteArray& studyUID, std::vector<ImageC
     return askDatabase([&](SqlConnection& connection) {
         QByteArray uid;
         {
+            // Read to its end before the next question is asked over the connection.
             SqlRows study = connection.ask("SELECT uid FROM study WHERE id = ?", {studyId});
             if (study.next())
                 uid = study.text(0);
         }
         std::vector<std::string> foreign;
+        // Shared with a series of this study, while its own series belongs to another one.
         SqlRows rows = connection.ask("SELECT DISTINCT file.path FROM series JOIN volume_share"
                                       " ON volume_share.series_id = series.id"
                                       " JOIN file ON file.path = volume_share.path"
@@ -173,6 +177,7 @@ bool IsDamagedFile(const char* path)
         return false;
     bool isDamaged = false;
     const Kdd::Result result = askDatabase([&](SqlConnection& connection) {
+        // Size and time must be those of now, because a file that has changed is read strictly again.
         SqlRows rows = connection.ask(
             "SELECT 1 FROM file WHERE path = ? AND size = ? AND modified = ? AND is_damaged = 1",
             {bytesValue(path), status.size, status.modified});

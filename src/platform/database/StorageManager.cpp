@@ -42,6 +42,7 @@ Kdd::Result StorageManager::retrieveStorageVolumes()
             if (const int number = volumeNumber(rows.text(0)); number > 0)
                 volumes.insert(number, rows.bytes(1));
     });
+    // The folders known so far stay when the database cannot be asked.
     if (result.good()) {
         const std::lock_guard<std::mutex> locker(sMutex);
         sVolumes = volumes.values().toVector();

@@ -7,6 +7,7 @@ namespace Kxg
 namespace
 {
 
+/// Column and value in one place, so that a statement and what is bound to it cannot get out of step.
 struct Attribute
 {
     const char* column;

@@ -37,6 +37,7 @@ QVector<QByteArray> pathsOf(const std::vector<ListedVolume>& volumes)
 {
     QVector<QByteArray> paths;
     for (const ListedVolume& volume : volumes) {
+        // A file that several series share is listed for each, in a row, since the order is by path.
         if (paths.isEmpty() || paths.last() != volume.path)
             paths.append(volume.path);
     }

@@ -43,6 +43,8 @@ SystemResult RandomAccessFile::open(const char* path)
 
 bool RandomAccessFile::isUnchanged() const
 {
+    // The open file is asked and not its name: another file put in its place leaves the bytes read here as
+    // they were.
     struct stat status = {};
     return ::fstat(mDescriptor, &status) == 0 && identityOf(status) == mIdentity;
 }

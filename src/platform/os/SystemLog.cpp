@@ -34,6 +34,7 @@ void writeToSystemLog(LogFile::Severity severity, const char* category, const st
     for (std::size_t start = 0; start <= line.size();) {
         const std::size_t end = std::min(line.find('\n', start), line.size());
         const std::string part = line.substr(start, end - start);
+        // Never as the format itself: a line may have percent signs.
         syslog(LOG_USER | priorityOf(severity), "%s%s", prefix.c_str(), part.c_str());
         start = end + 1;
     }

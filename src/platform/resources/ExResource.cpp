@@ -55,6 +55,7 @@ QString filePath()
 Values readFile()
 {
     const QString path = filePath();
+    // Nothing is read then, because Qt would look for a file of another name.
     if (!isPlainText(qgetenv("KDD_CONFIG"))) {
         LogFile::warnf("The settings in %s cannot be read: the name is no text",
                        qgetenv("KDD_CONFIG").constData());
@@ -78,6 +79,7 @@ Values readFile()
 
 QByteArray valueOf(const Setting& setting)
 {
+    // Asked anew each time, while the file is read once.
     QByteArray fromEnvironment = qgetenv(setting.variable);
     if (!fromEnvironment.isEmpty())
         return fromEnvironment;
@@ -88,6 +90,7 @@ QByteArray valueOf(const Setting& setting)
 
 QByteArray endpoint(const Setting& setting)
 {
+    // The bucket's name is put directly behind.
     const QByteArray address = valueOf(setting);
     return address.endsWith('/') ? address : address + '/';
 }

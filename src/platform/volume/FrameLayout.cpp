@@ -36,6 +36,7 @@ Result checkBits(const FrameLayout& layout)
 
 Result checkSize(const FrameLayout& layout)
 {
+    // All factors come from 16-bit numbers, so the product cannot wrap.
     if (layout.rows > 0 && layout.columns > 0 && layout.frameBytes() <= kMaxFrameBytes)
         return Result();
     return Result::failure(QStringLiteral("%1 columns and %2 rows are no size of an image")
@@ -98,6 +99,7 @@ Result readFrameLayout(DcmItem& dataset, FrameLayout& layout)
 int numberOfFrames(DcmItem& dataset)
 {
     Sint32 frames = 0;
+    // One that is absent or not positive: there is a frame wherever there are pixels.
     return dataset.findAndGetSint32(DCM_NumberOfFrames, frames).good() && frames > 0 ? frames : 1;
 }
 

@@ -32,6 +32,7 @@ Info infoOf(const ShownPixels& shown, double aspect, bool isInverted)
 QVector<int> candidates(int frames)
 {
     QVector<int> numbers;
+    // Six twelfths are the middle, four and eight the ends of the middle third.
     for (const int twelfth : {6, 5, 7, 4, 8}) {
         const auto number = static_cast<int>(qint64(frames) * twelfth / 12);
         if (number < frames && !numbers.contains(number))
@@ -78,6 +79,7 @@ Info showFrame(DcmDataset& dataset, int width, int height, Result& result)
 {
     int number = 0;
     StoredFrame frame;
+    // By the larger of the two, since a codec halves both sides at once and neither may fall below.
     result = readRepresentative(dataset, qMax(width, height), number, frame);
     if (result.bad())
         return nullptr;
@@ -104,6 +106,7 @@ DcmPixelSequence* findVideo(DcmDataset& dataset)
     E_TransferSyntax xfer = EXS_Unknown;
     DcmPixelSequence* fragments =
         dataset.findAndGetElement(DCM_PixelData, pixels).good() ? findFragments(*pixels, xfer) : nullptr;
+    // Its fragments are one stream, of which no frame can be read alone.
     return isVideo(xfer) ? fragments : nullptr;
 }
 

@@ -39,6 +39,7 @@ ValueRange rangeFor(const ParamBundle& parameters, const TypedData2D& pixels)
     if (center.isEmpty() || width.isEmpty() || !(width.first() > 0))
         return values;
     const ValueRange window = windowRange(center.first(), width.first());
+    // A window that shows none of the values was made for others.
     return window.overlaps(values) ? window : values;
 }
 
