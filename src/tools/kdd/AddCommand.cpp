@@ -48,6 +48,7 @@ void report(const GlobalOptions& options, const FileScan& scan, const StudyIntak
 {
     const QMap<QByteArray, StudyTotals>& studies = intake.studies();
     const StudyTotals all = sumOf(studies);
+    // To whoever asked it is one list, whether a file could not be read or what was in it could not be taken.
     std::vector<RefusedFile> refused = scan.refused();
     refused.insert(refused.end(), intake.refused().begin(), intake.refused().end());
     const int failed = static_cast<int>(refused.size());
@@ -77,6 +78,7 @@ Outcome runAdd(const GlobalOptions& options, const ScanRequest& request)
         return Outcome::Failed;
     CommandProgress progress("Taking", !options.quiet);
     FileScan scan(*database, progress);
+    // The archive may lie below the paths, and must not take in what it keeps itself.
     scan.setOwnPlaces(ownPlaces(options));
     scan.setNamesSkipped(options.verbose);
     scan.setDamage(request.tolerant ? Damage::Tolerated : Damage::Refused);
@@ -84,6 +86,7 @@ Outcome runAdd(const GlobalOptions& options, const ScanRequest& request)
     Result taken = scan.run(request.paths, [&](DicomInput input) { return intake.take(std::move(input)); });
     if (taken.good())
         taken = intake.finish();
+    // Unchanged files may be those of an earlier run that was ended before their studies were complete.
     if (taken.good() && scan.unchanged() > 0)
         taken = intake.completeWaiting(request.paths);
     const bool isDone = succeeded(taken);

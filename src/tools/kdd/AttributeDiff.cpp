@@ -13,6 +13,7 @@ namespace
 
 using Report = std::function<void(const AttributeDifference&)>;
 
+/// The value as a difference shows it. Sequences and omitted values have none to show.
 QByteArray describe(const TagMap& node, const TagMap::iterator& it)
 {
     const TagElement& element = *it.value();
@@ -35,6 +36,8 @@ public:
 
     void compare(const TagMap& left, const TagMap& right, const QByteArray& prefix)
     {
+        // Both views are in the order of their keys, so one walk through both finds what either of them
+        // lacks.
         const TagMap::iterator end = left.end();
         TagMap::iterator mine = left.begin();
         TagMap::iterator theirs = right.begin();
@@ -58,6 +61,7 @@ private:
         if (mine != nullptr && theirs != nullptr &&
             !differ(*mine->value(), *theirs->value(), prefix + keyText(key)))
             return;
+        // A private name needs the creator, which stands where the attribute does.
         const TagMap& named = mine != nullptr ? left : right;
         mReport({prefix + keyText(key), keywordOf(named, key), mine != nullptr ? describe(left, *mine) : "-",
                  theirs != nullptr ? describe(right, *theirs) : "-"});
@@ -70,6 +74,7 @@ private:
             return mine.isSequence() != theirs.isSequence() || !mine.compare(theirs, true, nullptr);
         const auto& left = static_cast<const TagSequence&>(mine);
         const auto& right = static_cast<const TagSequence&>(theirs);
+        // Items have no names, so of different numbers none can be told to belong together.
         if (left.numItems() != right.numItems())
             return true;
         for (int i = 0; i < left.numItems(); ++i)

@@ -99,6 +99,7 @@ std::vector<std::string> namesOf(const CLI::Option& option)
 
 void writeTables(std::ostream& out, const CLI::App& app)
 {
+    // What values there are is kept by option, and for those without option by their place.
     std::string options;
     std::string kinds;
     std::string places;

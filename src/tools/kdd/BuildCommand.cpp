@@ -46,6 +46,7 @@ Outcome runBuild(const GlobalOptions& options, const BuildRequest& request)
     const std::unique_ptr<Kxg::Catalogue> database = openExistingDatabase();
     QVector<QByteArray> named;
     int expected = 0;
+    // In this order, so that what is asked for here is in the queue before it is counted.
     if (database == nullptr || !chooseStudies(*database, request.selection.studies, false, named) ||
         (request.settle && !succeeded(database->settleNow())) ||
         (request.selection.all && !succeeded(requestStale(*database, request.again))) ||
@@ -53,6 +54,7 @@ Outcome runBuild(const GlobalOptions& options, const BuildRequest& request)
         return Outcome::Failed;
     CommandProgress progress("Building", !options.quiet);
     StudyBuilders builders(progress, request.jobs, !request.leavesPlaces);
+    // Without names the queue is worked off, which any number of processes do together.
     const BuildTotals totals = named.isEmpty() ? builders.buildWaiting(expected) : builders.build(named);
     report(options, totals);
     const QByteArray finished = QByteArray::number(totals.studies) + " studies are built";

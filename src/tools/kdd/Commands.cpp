@@ -79,10 +79,13 @@ void ArgumentList::path(const Argument& argument, QString& value)
 
 ArgumentList CommandSet::declare(const CommandText& text, const Run& run)
 {
+    // The parser knows one text for both; summaryOf and detailsOf take it apart again.
     CLI::App* command = mApp.add_subcommand(text.name, std::string(text.summary) + "\n\n" + text.details);
     command->group(text.group);
     command->footer(text.examples);
+    // The options of every command may stand behind its name, too.
     command->fallthrough();
+    // Run later, when the whole line is read and the global options are in force.
     command->callback([&chosen = mChosen, run] { chosen = run; });
     return ArgumentList(*command);
 }

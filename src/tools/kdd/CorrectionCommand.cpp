@@ -28,6 +28,7 @@ struct CorrectionRequest
     QString imageList;  ///< file that names further images, one on each line; empty for none
 };
 
+// Room for a million UIDs.
 constexpr qint64 kMaxImageList = 64 * 1024 * 1024;
 
 bool readFile(const QString& name, qint64 limit, QByteArray& content)
@@ -65,6 +66,7 @@ bool readImages(const CorrectionRequest& request, QAData& job)
         return false;
     for (const QByteArray& line : list.split('\n')) {
         const QByteArray uid = line.trimmed();
+        // The last line ends in a line feed, behind which there is an empty one.
         if (!uid.isEmpty())
             job.images.append(uid);
     }
@@ -80,6 +82,7 @@ bool hasTagFile(const QByteArray& studyUID)
 bool resolveStudies(const CorrectionRequest& request, QAData& job)
 {
     job.studyUID = request.study;
+    // No move: the study is there, and a beginning of its UID is enough.
     if (job.oldStudyUID.isEmpty())
         return resolveStudy(request.study, job.studyUID);
     if (hasTagFile(job.oldStudyUID) || hasTagFile(job.studyUID))
@@ -92,6 +95,7 @@ bool resolveStudies(const CorrectionRequest& request, QAData& job)
 void report(const GlobalOptions& options, const QAData& job)
 {
     const QAData::Outcome& outcome = job.outcome;
+    // Told of the study in which they were looked for, which of a move is the old one.
     for (const QByteArray& uid : outcome.notFound)
         LogFile::errorf("There is no image %s in study %s", uid.constData(),
                         (job.oldStudyUID.isEmpty() ? job.studyUID : job.oldStudyUID).constData());

@@ -25,6 +25,7 @@ struct DiffRequest
     QString right;
 };
 
+// The first bytes of every tag file.
 constexpr char kTagFileMagic[] = "TaCa";
 
 bool isTagFile(const QString& path)
@@ -36,6 +37,7 @@ bool isTagFile(const QString& path)
 /// Reads what the user names: a tag file, a DICOM file, or a study of the store.
 bool readNamed(const QString& name, TagFile& file)
 {
+    // A file goes before a study of the same name.
     if (!QFileInfo(name).isFile())
         return readStudy(name.toLocal8Bit(), file);
     if (isTagFile(name))
@@ -71,6 +73,7 @@ public:
             else
                 tell(it.key(), {"", "", "image", "-"});
         }
+        // What only the right side has.
         for (auto it = theirs.cbegin(); it != theirs.cend(); ++it) {
             if (!mine.contains(it.key()))
                 tell(it.key(), {"", "", "-", "image"});

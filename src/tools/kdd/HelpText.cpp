@@ -55,6 +55,7 @@ std::string HelpText::make_subcommand(const CLI::App* command) const
 
 std::string HelpText::make_footer(const CLI::App* app) const
 {
+    // The tool as a whole has a hint there and no examples.
     if (app->get_parent() == nullptr)
         return app->get_footer() + "\n";
     return "Examples:\n" + indented(app->get_footer()) +
@@ -76,6 +77,7 @@ std::string detailsOf(const CLI::App& command)
 
 std::string kindOf(const CLI::Option& option)
 {
+    // A flag has no value, though the parser may have a name for its type.
     return option.get_type_size() == 0 ? std::string() : option.get_type_name();
 }
 

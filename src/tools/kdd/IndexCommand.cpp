@@ -24,12 +24,14 @@ Outcome runIndex(const GlobalOptions& options, const ScanRequest& request)
         return Outcome::Failed;
     CommandProgress progress("Reading", !options.quiet);
     FileScan scan(*database, progress);
+    // The archive may lie below the paths, and must not take in what it keeps itself.
     scan.setOwnPlaces(ownPlaces(options));
     scan.setNamesSkipped(options.verbose);
     scan.setDamage(request.tolerant ? Damage::Tolerated : Damage::Refused);
     Registration registration(*database);
     Result registered =
         scan.run(request.paths, [&](const DicomInput& input) { return registration.add(input); });
+    // The last files are still held back, as registering is done for many at once.
     if (registered.good())
         registered = registration.flush();
     const bool isDone = succeeded(registered);

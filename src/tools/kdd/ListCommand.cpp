@@ -80,6 +80,7 @@ void printList(const QList<ListedStudy>& studies)
     for (const ListedStudy& study : studies)
         rows.append({study.uid, study.patient, study.date, study.modalities, QString::number(study.series),
                      QString::number(study.images), QString::number(study.volumes),
+                     // The size of a tag file that is about to be written anew says little.
                      study.isWaiting ? QStringLiteral("waiting") : humanBytes(study.bytes)});
     printTable(rows);
 }
@@ -117,8 +118,11 @@ private:
 
 bool passes(const Kxg::StudySummary& study, const ListRequest& request)
 {
+    // With a line feed between them, so that nothing is found across the two.
     const QString patient = QString::fromUtf8(study.patientName + '\n' + study.patientID);
+    // An empty text is part of every other one.
     return patient.contains(QString::fromLocal8Bit(request.patient), Qt::CaseInsensitive) &&
+           // Modalities are written in capital letters.
            (request.modality.isEmpty() || study.modalities.split(' ').contains(request.modality.toUpper())) &&
            (!request.waiting || study.isWaiting);
 }

@@ -77,6 +77,7 @@ void writeCommand(std::ostream& out, const CLI::App& command)
 {
     const std::string name = "kdd " + command.get_name();
     const std::string usage = HelpText().make_usage(&command, name);
+    // The line of the usage without its heading, which the page has of its own.
     out << ".SS " << escaped(name) << '\n'
         << escaped(summaryOf(command)) << ".\n.PP\n"
         << escaped(usage.substr(usage.find(name), usage.find('\n') - usage.find(name))) << "\n.PP\n"

@@ -28,6 +28,7 @@ Outcome runMetadata(const GlobalOptions& /*options*/, const NodeSelection& selec
         return Outcome::Failed;
     QList<const TagMap*> images;
     collectImages(*node, images);
+    // Written image by image: as a whole the array may be many times as large as the study's tag file.
     const char* separator = "[\n";
     for (const TagMap* image : qAsConst(images)) {
         std::cout << separator;

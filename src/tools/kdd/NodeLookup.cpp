@@ -21,6 +21,7 @@ TagMap* findNode(const NodeSelection& selection, TagFile& file)
     if (selection.image.isEmpty())
         return selection.series.isEmpty() ? file.study().get() : series;
     TagMap* image = file.findImage(selection.image);
+    // Looked for in the whole study, and then held against the series that was named.
     if (image != nullptr && (selection.series.isEmpty() || image->parent() == series))
         return image;
     LogFile::errorf("Study %s has no image %s%s%s", file.studyInstanceUID().constData(),

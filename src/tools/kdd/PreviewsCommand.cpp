@@ -27,6 +27,7 @@ struct PreviewsRequest
 Outcome runPreviews(const GlobalOptions& options, const PreviewsRequest& request)
 {
     QList<QByteArray> named = request.names;
+    // The parser cannot tell studies and folder apart. There is a last value, since one is required.
     const QString folder = pathOf(named.takeLast());
     if (request.all != named.isEmpty()) {
         LogFile::errorf("Name the studies whose previews to export, or --all");

@@ -41,6 +41,7 @@ Result send(QFile& file, KxCurlUploadStream& stream, Progress& progress)
         stream.abandon();
         return Result::failure(file.errorString());
     }
+    // Only closing tells whether the object is there.
     stream.close();
     return stream.good() ? Result() : Result::failure(QString::fromStdString(stream.error()));
 }
@@ -52,6 +53,7 @@ Result upload(QFile& file, const QByteArray& url, Progress& progress)
         stream.leaveErrorsToCaller();
         return send(file, stream, progress);
     } catch (const std::invalid_argument&) {
+        // Wrong usage, which ends the command with another exit code.
         throw;
     } catch (const std::exception& fault) {
         return Result::failure(QString::fromStdString(explained(fault)));

@@ -41,6 +41,7 @@ void printTable(const QList<QStringList>& rows)
         QString line;
         for (int i = 0; i < row.size(); ++i) {
             const bool isNumber = rows.first().at(i).endsWith(QLatin1Char(' '));
+            // The blank in the heading was only the mark.
             const QString cell = row.at(i).trimmed();
             line += isNumber ? cell.rightJustified(widths.at(i)) : cell.leftJustified(widths.at(i));
             line += QStringLiteral("  ");
@@ -65,6 +66,7 @@ QString withoutControls(const QString& text)
 {
     QString shown = text;
     for (QChar& c : shown) {
+        // The upper range as well, for some terminals obey those too.
         if (c < QLatin1Char(' ') || (c >= QChar(0x7f) && c < QChar(0xa0)))
             c = QLatin1Char(' ');
     }

@@ -25,6 +25,7 @@ Outcome runSample(const GlobalOptions& options, const SampleRequest& request)
 {
     SampleSummary summary;
     Result result;
+    // The line of the progress is wiped before anything else is written.
     {
         Progress progress("Writing", !options.quiet);
         result = writeSampleStudies(

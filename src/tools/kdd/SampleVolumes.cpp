@@ -20,6 +20,7 @@ void addImages(const QDir& seriesFolder, TagFile& file)
 {
     for (const QString& name : seriesFolder.entryList({QStringLiteral("*.dcm")}, QDir::Files, QDir::Name)) {
         const QByteArray path = seriesFolder.filePath(name).toLocal8Bit();
+        // filePathOf finds it there when the stack is written.
         if (TagMap* image = file.addDicomFile(path.constData(), path.constData(), false))
             image->putAndInsertValue(kFilePath, VrCode::LO, path);
     }

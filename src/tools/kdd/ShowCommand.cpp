@@ -48,6 +48,7 @@ QString describe(const TagMap& node, int depth)
     }
 }
 
+/// Down to `lowest`: 0 is the study, 1 its series, 2 the images.
 void printTree(const TagMap& node, int depth, int lowest)
 {
     std::printf("%*s%s\n", depth * 2, "", qUtf8Printable(describe(node, depth)));
@@ -117,6 +118,7 @@ Outcome runShow(const GlobalOptions& options, const ShowOptions& show)
         printJson(treeOf(*node, depthOf(*node)));
     else if (options.json)
         writeAttributes(*node, show.own);
+    // The images of a whole study are too many to be listed unasked.
     else if (show.tree)
         printTree(*node, depthOf(*node), options.verbose || depthOf(*node) > 0 ? 2 : 1);
     else

@@ -51,6 +51,7 @@ Outcome runStack(const GlobalOptions& options, const StackRequest& request)
     const bool wantsAll = request.selection.all || request.selection.studies.isEmpty();
     if (database == nullptr)
         return Outcome::Failed;
+    // What is found is stacked, also when another study is not.
     bool isDone = chooseStudies(*database, request.selection.studies, wantsAll, studyUIDs);
     QJsonArray told;
     int volumes = 0;

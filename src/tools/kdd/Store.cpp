@@ -23,6 +23,7 @@ constexpr int kNamesToTell = 3;
 
 bool resolveStudy(const QByteArray& text, QByteArray& studyUID)
 {
+    // A whole UID needs no database, so that tag files can be looked at without one.
     if (presenceOf(TagFile::cacheFilePathForStudy(text.constData())) != FilePresence::Absent) {
         studyUID = text;
         return true;
@@ -37,6 +38,7 @@ bool resolveStudy(Kxg::Catalogue& database, const QByteArray& text, QByteArray& 
     // Every UID begins with nothing, but whoever names nothing has not chosen a study.
     if (!text.isEmpty() && !succeeded(database.findStudies(text, kNamesToTell, found)))
         return false;
+    // A whole UID means its study, also when longer ones begin with it.
     if (found.size() == 1 || found.contains(text)) {
         studyUID = found.contains(text) ? text : found.first();
         return true;
@@ -71,6 +73,7 @@ bool readTagFile(const QString& path, TagFile& file)
 {
     if (file.readWhenFree(path, nullptr, false))
         return true;
+    // Of these two the reader says nothing itself, because callers know what they mean.
     if (presenceOf(path) == FilePresence::Absent || file.wasLockedOut())
         LogFile::errorf("Could not open %s: %s", qUtf8Printable(path), qUtf8Printable(file.failure()));
     return false;
@@ -81,6 +84,7 @@ QList<QByteArray> ownPlaces(const GlobalOptions& options)
     QList<QByteArray> places = {absolutePath(TagFile::metaFolder()) + '/',
                                 absolutePath(pathBytes(options.volumeFolder())) + '/'};
     const QByteArray address = Kxg::DatabaseServer();
+    // A server keeps its files elsewhere.
     if (address.startsWith("sqlite:")) {
         const QByteArray database = absolutePath(address.mid(7));
         for (const char* suffix : {"", "-wal", "-shm", "-journal", ".claims"})
