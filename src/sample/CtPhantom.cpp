@@ -14,6 +14,7 @@ constexpr double kAir = -1000;      // [HU]
 constexpr double kLung = -860;      // [HU]
 constexpr double kBreathing = 320;  // length of a chest [mm]; what is longer shows the next one
 
+// Painted one on top of the other: the last one covers those before.
 const SampleEllipse kTrunk[] = {
     {0, 0.86, 0.70, 0.05, -300},  // table top
     {0, 0, 0.90, 0.66, -95},      // fat

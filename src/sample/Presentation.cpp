@@ -44,6 +44,7 @@ const SampleAttribute kText[] = {
     {DCM_BoundingBoxTextHorizontalJustification, "LEFT"},
 };
 
+// A closed line: its last point is its first. Reals that floats hold exactly.
 const SampleAttribute kPolyline[] = {
     {DCM_GraphicAnnotationUnits, "PIXEL"}, {DCM_GraphicDimensions, "2"},
     {DCM_NumberOfGraphicPoints, "4"},      {DCM_GraphicData, "36\\24\\44.5\\22.25\\43.75\\31\\36\\24"},

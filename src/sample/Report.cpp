@@ -28,6 +28,7 @@ const SampleCode kConclusion = {"121077", "DCM", "Conclusion"};
 const SampleCode kImage = {"121080", "DCM", "Best illustration of finding"};
 const SampleCode kMillimetre = {"mm", "UCUM", "millimeter"};
 
+// Longer than most values, with line ends in it, and within what a tag file keeps.
 const char* const kLongFinding = "In the right lower lobe lies a round nodule that is clearly delimited and "
                                  "not calcified. It lies against the "
                                  "pleura, which is not thickened. There are no further nodules, no effusion "
@@ -63,11 +64,13 @@ void addFindings(SampleDataset& document, const SampleSeries& slices, SampleRand
     content(nodule, "TEXT", kFinding).with(DCM_TextValue, kLongFinding);
     content(nodule, "CODE", kFinding)
         .item(DCM_ConceptCodeSequence)
+        // Too long for the usual code value, so it stands in the attribute for long ones.
         .with(DCM_LongCodeValue, "round-nodule/clearly-delimited")
         .with(DCM_CodingSchemeDesignator, "99SAMPLE")
         .with(DCM_CodeMeaning, "Clearly delimited round nodule");
     addDistance(nodule, random);
     SampleDataset image = content(nodule, "IMAGE", kImage);
+    // The report points to one image, whose series and study it names as evidence below.
     slices.refer(image, DCM_ReferencedSOPSequence, 2);
 }
 
