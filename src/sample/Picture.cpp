@@ -84,7 +84,7 @@ void SamplePicture::addUnsigned(SampleDataset& dataset, int offset, int bitsStor
     const QVector<Uint16> pixels = words(offset, 0, (1 << bitsStored) - 1);
     const auto range = std::minmax_element(pixels.begin(), pixels.end());
     add(dataset, pixels, bitsStored);
-    // The representations of the last two are named, since the dictionary leaves it to the pixels which they are.
+    // The last two name their representation, since the dictionary leaves it to the pixels.
     dataset.with(DCM_PixelRepresentation, 0)
         .with(DcmTag(DCM_SmallestImagePixelValue, EVR_US), *range.first)
         .with(DcmTag(DCM_LargestImagePixelValue, EVR_US), *range.second);

@@ -40,10 +40,12 @@ void printTotals(const QMap<QByteArray, StudyTotals>& studies)
                      QString::number(study.volumes), humanBytes(study.fileBytes),
                      humanBytes(study.headerBytes), humanBytes(study.tagFileBytes)});
     }
+    // A heading without rows says nothing that the line of the totals does not say.
     if (rows.size() > 1)
         printTable(rows);
 }
 
+/// Also after a failure: what was taken until then is taken.
 void report(const GlobalOptions& options, const FileScan& scan, const StudyIntake& intake)
 {
     const QMap<QByteArray, StudyTotals>& studies = intake.studies();
@@ -82,6 +84,7 @@ Outcome runAdd(const GlobalOptions& options, const ScanRequest& request)
     scan.setOwnPlaces(ownPlaces(options));
     scan.setNamesSkipped(options.verbose);
     scan.setDamage(request.tolerant ? Damage::Tolerated : Damage::Refused);
+    // Gathers what the scan hands on, so that a study is completed once for all its files.
     StudyIntake intake(*database, progress);
     Result taken = scan.run(request.paths, [&](DicomInput input) { return intake.take(std::move(input)); });
     if (taken.good())
@@ -92,6 +95,7 @@ Outcome runAdd(const GlobalOptions& options, const ScanRequest& request)
     const bool isDone = succeeded(taken);
     report(options, scan, intake);
     const QByteArray finished = QByteArray::number(intake.studies().size()) + " studies are complete";
+    // An interrupt is told in any case, also when something else failed.
     const bool isWhole =
         !toldOfInterrupt(finished.constData()) && scan.refused().empty() && intake.refused().empty();
     return isDone && isWhole ? Outcome::Done : Outcome::Failed;
@@ -109,6 +113,8 @@ void declareAdd(CommandSet& commands)
         "kdd add day                            # a folder\n"
         "kdd --json add day/*/*                 # counts for a script\n"
         "kdd add --tolerant day --verbose       # also of damaged files what is sound"};
+    // Filled while the command line is read and used when the command runs, which is later than this
+    // function.
     const auto request = std::make_shared<ScanRequest>();
     ArgumentList arguments =
         commands.declare(text, [request](const GlobalOptions& options) { return runAdd(options, *request); });

@@ -26,6 +26,7 @@ QByteArray describe(const TagMap& node, const TagMap::iterator& it)
     return QByteArray(vrName(element.vr())) + " [" + text + ']';
 }
 
+/// Walks two views side by side, and the items of their sequences likewise.
 class NodeComparison
 {
 public:
@@ -71,6 +72,7 @@ private:
     bool differ(const TagElement& mine, const TagElement& theirs, const QByteArray& path)
     {
         if (!mine.isSequence() || !theirs.isSequence())
+            // A sequence and a value differ whatever is in them.
             return mine.isSequence() != theirs.isSequence() || !mine.compare(theirs, true, nullptr);
         const auto& left = static_cast<const TagSequence&>(mine);
         const auto& right = static_cast<const TagSequence&>(theirs);

@@ -29,6 +29,7 @@ QByteArray keywordOf(const TagMap& node, const DcmTagKey& key)
 QString displayText(const TagMap& node, const QByteArray& bytes)
 {
     QByteArray characterSet;
+    // As the node shows it, so that an inherited character set counts too.
     node.findAndGetString(DCM_SpecificCharacterSet, characterSet);
     return withoutControls(decodeText(bytes, characterSet));
 }

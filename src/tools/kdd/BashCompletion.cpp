@@ -124,6 +124,7 @@ void writeTables(std::ostream& out, const CLI::App& app)
 
 void writeBashCompletion(std::ostream& out, const CLI::App& app)
 {
+    // The tables first, because the script reads them when the user asks for a completion.
     out << kTables << "_kdd_commands='";
     for (const CLI::App* command : app.get_subcommands({}))
         out << command->get_name() << ' ';

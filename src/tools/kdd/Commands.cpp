@@ -20,6 +20,7 @@ QByteArray bytes(const std::string& text)
 
 void present(CLI::Option& option, const Argument& argument)
 {
+    // The kind is what help, manual and completion tell of the value.
     option.type_name(argument.kind);
     option.required(argument.isRequired);
 }
@@ -41,6 +42,7 @@ void ArgumentList::flag(const char* name, bool& value, const char* what)
 
 void ArgumentList::number(const char* name, int least, int greatest, int& value, const char* what)
 {
+    // The parser refuses what lies outside, so no command checks its numbers itself.
     CLI::Range range(least, greatest);
     range.description("");  // the kind tells it already
     const std::string kind = std::to_string(least) + '-' + std::to_string(greatest);

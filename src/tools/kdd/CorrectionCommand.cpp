@@ -52,6 +52,7 @@ bool readJob(const CorrectionRequest& request, QAData& job)
     QString message;
     if (!readFile(request.job, kMaxJobXml, xml))
         return false;
+    // The message names the line, and here the file is added.
     if (job.parse(xml, message))
         return true;
     LogFile::errorf("%s: %s", qUtf8Printable(request.job), qUtf8Printable(message));
@@ -73,6 +74,7 @@ bool readImages(const CorrectionRequest& request, QAData& job)
     return true;
 }
 
+/// Asked of the folder, because a study that the database does not know can be corrected as well.
 bool hasTagFile(const QByteArray& studyUID)
 {
     return QFile::exists(TagFile::cacheFilePathForStudy(studyUID.constData()));
@@ -85,6 +87,7 @@ bool resolveStudies(const CorrectionRequest& request, QAData& job)
     // No move: the study is there, and a beginning of its UID is enough.
     if (job.oldStudyUID.isEmpty())
         return resolveStudy(request.study, job.studyUID);
+    // Either will do: a first move has to make the one, and one that broke off may have emptied the other.
     if (hasTagFile(job.oldStudyUID) || hasTagFile(job.studyUID))
         return true;
     LogFile::errorf("Neither study %s nor study %s has a tag file", job.oldStudyUID.constData(),
@@ -123,6 +126,7 @@ Outcome runCorrection(const GlobalOptions& options, const CorrectionRequest& req
     if (!succeeded(StudyChange::correct(job).within(QStringLiteral("The correction is not made"))))
         return Outcome::Failed;
     report(options, job);
+    // The others are corrected, but not all that was asked for is done.
     return job.outcome.notFound.isEmpty() ? Outcome::Done : Outcome::Failed;
 }
 

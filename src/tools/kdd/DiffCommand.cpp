@@ -31,6 +31,7 @@ constexpr char kTagFileMagic[] = "TaCa";
 bool isTagFile(const QString& path)
 {
     QFile file(path);
+    // By what it begins with: copies of tag files may have any name.
     return file.open(QIODevice::ReadOnly) && file.read(4) == kTagFileMagic;
 }
 
@@ -43,6 +44,7 @@ bool readNamed(const QString& name, TagFile& file)
     if (isTagFile(name))
         return readTagFile(name, file);
     const QByteArray path = name.toLocal8Bit();
+    // What is left out of a damaged file would show as a difference.
     DicomInput input = readDicomInput(path, Damage::Refused);
     if (input.kind == DicomInput::Kind::Image)
         return file.addTagMap(input.map.release(), path.constData(), true) != nullptr;
@@ -58,6 +60,7 @@ public:
     {
     }
 
+    /// Image by image, with what each inherits: where a value is stored makes no difference.
     void compare(const TagFile& left, const TagFile& right)
     {
         const auto& mine = left.imagesByUID();
@@ -86,6 +89,7 @@ public:
             printJson({{QStringLiteral("differences"), mList}});
         else if (!mOptions.quiet)
             std::printf("%d differences\n", mCount);
+        // A difference is a fault that was found.
         return mCount == 0 ? Outcome::Done : Outcome::Failed;
     }
 

@@ -110,6 +110,7 @@ bool Fetch::begin()
     if (!goOn() && !beginAnew())
         return false;
     mDone = mResumedAt;
+    // Of the whole object, also when only the rest of it comes.
     mLength = mStream.contentLength();
     return true;
 }
@@ -168,6 +169,7 @@ bool Fetch::copy()
 
 bool Fetch::isComplete()
 {
+    // The stream ends alike for a whole object and for one that broke off; only the status tells.
     if (!mStream.httpStatus().ok())
         return explain();
     // A transfer may end too early without any error.
@@ -207,8 +209,10 @@ Outcome runGet(const GlobalOptions& options, const GetRequest& request)
     if (target.isEmpty())
         return Outcome::WrongUsage;
     PartialFile file(target);
+    // Locked before anything is asked for, so that two processes do not fetch the same file.
     if (!file.open())
         return Outcome::Failed;
+    // Settings of the whole process, which fetches nothing else.
     KxCurlClient::instance().setNumConcurrentRequestsPerFile(request.parallel);
     KxCurlClient::instance().setChunkSizeForPartialRequests(kRange);
     Fetch fetch(request, options, file);

@@ -93,6 +93,7 @@ void GlobalArguments::applyLogging() const
 
 void GlobalArguments::applyStore()
 {
+    // Set for the whole process before there is a second thread.
     mOptions.store = storeFolder();
     const QByteArray root = pathBytes(mOptions.store);
     // What the command line says goes before the site's settings, and these before a place in the store.

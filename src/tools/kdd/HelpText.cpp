@@ -34,6 +34,7 @@ std::string indented(const std::string& lines)
 
 std::string HelpText::make_description(const CLI::App* app) const
 {
+    // The tool itself has a summary only.
     const std::string details = detailsOf(*app);
     return summaryOf(*app) + "\n" + (details.empty() ? "" : "\n" + wrapped(details) + "\n\n");
 }

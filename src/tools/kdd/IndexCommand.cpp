@@ -17,6 +17,7 @@ namespace Kdd
 namespace
 {
 
+/// The same scan as when images are taken in, but the studies are left waiting for others to build.
 Outcome runIndex(const GlobalOptions& options, const ScanRequest& request)
 {
     const std::unique_ptr<Kxg::Catalogue> database = openDatabase();
@@ -34,6 +35,7 @@ Outcome runIndex(const GlobalOptions& options, const ScanRequest& request)
     // The last files are still held back, as registering is done for many at once.
     if (registered.good())
         registered = registration.flush();
+    // Counts are told after a failure as well: what is registered stays registered.
     const bool isDone = succeeded(registered);
     const int studies = registration.studies().size();
     const int failed = static_cast<int>(scan.refused().size());

@@ -43,6 +43,7 @@ struct ListedStudy
 ListedStudy describe(const Kxg::StudySummary& study)
 {
     const QString tagFile = TagFile::cacheFilePathForStudy(study.studyInstanceUID.constData());
+    // Values come from files, and a terminal must not obey what is in them.
     return {displayText(study.studyInstanceUID),
             displayText(study.patientName),
             displayText(study.studyDate),
@@ -91,6 +92,7 @@ class DateRange
 public:
     bool parse(const QByteArray& text)
     {
+        // A day alone is the range from itself to itself.
         const int dash = text.indexOf('-');
         mFrom = dash < 0 ? text : text.left(dash);
         mTo = dash < 0 ? text : text.mid(dash + 1);
@@ -130,6 +132,7 @@ bool passes(const Kxg::StudySummary& study, const ListRequest& request)
 Outcome runList(const GlobalOptions& options, const ListRequest& request)
 {
     DateRange dates;
+    // Refused before the database is asked.
     if (!dates.parse(request.date)) {
         LogFile::errorf("\"%s\" is no date YYYYMMDD and no range of dates", request.date.constData());
         return Outcome::WrongUsage;

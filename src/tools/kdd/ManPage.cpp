@@ -83,6 +83,7 @@ void writeCommand(std::ostream& out, const CLI::App& command)
         << escaped(usage.substr(usage.find(name), usage.find('\n') - usage.find(name))) << "\n.PP\n"
         << escaped(detailsOf(command)) << '\n';
     writeOptions(out, command);
+    // Examples stand line by line as they are.
     out << ".PP\n.EX\n" << escaped(command.get_footer()) << "\n.EE\n";
 }
 
@@ -90,6 +91,7 @@ void writeCommand(std::ostream& out, const CLI::App& command)
 
 void writeManPage(std::ostream& out, const CLI::App& app)
 {
+    // Without a date, so that the same sources give the same page.
     out << ".TH KDD 1 \"\" \"" << escaped(BuildInfo::text()) << "\" \"User Commands\"\n.SH NAME\nkdd \\- "
         << escaped(summaryOf(app))
         << "\n.SH SYNOPSIS\n.B kdd\n[\\fIOPTIONS\\fR] \\fICOMMAND\\fR [\\fIARGUMENTS\\fR]\n"

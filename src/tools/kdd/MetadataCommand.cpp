@@ -12,6 +12,7 @@ namespace Kdd
 namespace
 {
 
+/// All images at or below a node, in the order of the tree.
 void collectImages(const TagMap& node, QList<const TagMap*>& images)
 {
     if (depthOf(node) == 2)
@@ -35,6 +36,7 @@ Outcome runMetadata(const GlobalOptions& /*options*/, const NodeSelection& selec
         writeDicomJson(std::cout, *image, bulkDataRoot(*image));
         separator = ",\n";
     }
+    // Without images it is an empty array, so that the result is valid in any case.
     std::cout << (images.isEmpty() ? "[]\n" : "\n]\n") << std::flush;
     return Outcome::Done;
 }

@@ -18,6 +18,7 @@ TagMap* findNode(const NodeSelection& selection, TagFile& file)
                         selection.series.constData());
         return nullptr;
     }
+    // The deepest node that is named is the one that is meant.
     if (selection.image.isEmpty())
         return selection.series.isEmpty() ? file.study().get() : series;
     TagMap* image = file.findImage(selection.image);

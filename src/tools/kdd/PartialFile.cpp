@@ -91,6 +91,7 @@ bool PartialFile::startOver(const Origin& origin)
     QFile::remove(recordPath());
     if (!mFile.resize(0) || !mFile.seek(0))
         return refuse("cannot be emptied", mFile.errorString());
+    // A part of unknown origin cannot be continued, so it gets no record.
     if (!origin.isRecognisable())
         return true;
     // The length as a text, for a number of JSON is a real.

@@ -41,6 +41,7 @@ Outcome runPreviews(const GlobalOptions& options, const PreviewsRequest& request
         LogFile::errorf("Could not create folder %s", qUtf8Printable(folder));
         return Outcome::Failed;
     }
+    // The previews of studies that are found are exported, also when another study is not.
     bool isDone = chooseStudies(*database, named, request.all, studyUIDs);
     int exported = 0;
     for (const QByteArray& studyUID : qAsConst(studyUIDs)) {
@@ -51,6 +52,7 @@ Outcome runPreviews(const GlobalOptions& options, const PreviewsRequest& request
             isDone = false;
     }
     if (!request.sheet.isEmpty()) {
+        // Of all pictures in the folder, those of earlier runs included.
         const Result result = writeContactSheet(folder, request.sheet);
         isDone = succeeded(result) && isDone;
     }

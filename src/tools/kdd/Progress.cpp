@@ -50,6 +50,7 @@ void Progress::show(qint64 done, qint64 total)
     const double rate = seconds > 0 ? static_cast<double>(done - mFirst) / seconds : 0;
     const QString rateText = countText(rate) + QStringLiteral("/s");
     const QString doneText = countText(static_cast<double>(done));
+    // Without a total there is neither a share nor an end to foretell.
     if (total <= 0) {
         std::fprintf(stderr, "\r\033[K%s %s  %s", mWhat, qUtf8Printable(doneText), qUtf8Printable(rateText));
         return;

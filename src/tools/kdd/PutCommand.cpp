@@ -50,6 +50,7 @@ Result upload(QFile& file, const QByteArray& url, Progress& progress)
 {
     try {
         KxCurlUploadStream stream = KxCurlClient::instance().write(url.toStdString());
+        // Told once, by the caller, with the names of file and object.
         stream.leaveErrorsToCaller();
         return send(file, stream, progress);
     } catch (const std::invalid_argument&) {
@@ -69,6 +70,7 @@ Outcome runPut(const GlobalOptions& options, const QString& path, const QByteArr
     }
     Result result;
     try {
+        // Gone, and its line wiped, before a result or a fault is told.
         Progress progress("Uploading", !options.quiet, Progress::Unit::Bytes);
         result = upload(file, url, progress);
     } catch (const std::invalid_argument& fault) {

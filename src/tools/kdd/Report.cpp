@@ -12,6 +12,7 @@ namespace Kdd
 
 void printJson(const QJsonObject& object)
 {
+    // On one line, so that scripts can read line by line.
     const QByteArray text = QJsonDocument(object).toJson(QJsonDocument::Compact);
     std::printf("%s\n", text.constData());
 }
@@ -52,6 +53,7 @@ void printTable(const QList<QStringList>& rows)
 
 QString humanBytes(qint64 bytes)
 {
+    // Powers of a thousand, as disks and networks are sold by.
     const char* const units[] = {"B", "KB", "MB", "GB", "TB"};
     auto value = static_cast<double>(bytes);
     int unit = 0;

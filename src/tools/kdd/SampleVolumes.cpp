@@ -31,6 +31,7 @@ Result stackFolder(const QDir& seriesFolder, int& volumes, qint64& bytes)
     TagFile file;
     addImages(seriesFolder, file);
     for (auto it = file.seriesByUID().cbegin(); it != file.seriesByUID().cend(); ++it) {
+        // A series of several stacks gives as many volumes, and one of none gives none.
         const StackPlan plan = planStacks(*it.value());
         for (int i = 0; i < plan.stacks.size(); ++i) {
             const QString path = seriesFolder.filePath(QString::fromLatin1(volumeFileName(it.key(), i)));

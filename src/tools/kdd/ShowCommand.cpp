@@ -26,6 +26,7 @@ struct ShowOptions
     bool tree = false;  ///< one line for each node instead of attributes
 };
 
+/// One line: what tells the node from its neighbours, and how many values it holds itself.
 QString describe(const TagMap& node, int depth)
 {
     const QString own = QStringLiteral("  (%1 own)").arg(node.tagsForLevel().size());

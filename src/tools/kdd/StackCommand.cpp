@@ -61,11 +61,14 @@ Outcome runStack(const GlobalOptions& options, const StackRequest& request)
         *database, {options.volumeFolder(), request.again,
                     request.ignoresFrameOfReference ? FrameOfReference::Ignored : FrameOfReference::Shared});
     for (const QByteArray& studyUID : qAsConst(studyUIDs)) {
+        // Asked between studies, so that none is left half stacked.
         if (progress.isCancelled())
             break;
+        // In this order: a study that fails does not keep the next one from being stacked.
         isDone = stacker.stack(studyUID) && isDone;
         for (const StackedSeries& series : stacker.series()) {
             volumes += series.volumes.size();
+            // Kept until the end, since the result is one value.
             told.append(jsonOf(series));
             if (!options.json && !options.quiet)
                 print(series);

@@ -63,6 +63,7 @@ bool readStudyFile(const QByteArray& studyUID, TagFile& file)
         return true;
     const QString path = TagFile::cacheFilePathForStudy(studyUID.constData());
     const bool isEmpty = presenceOf(path) == FilePresence::Empty;
+    // Such a file may have been left by a writer that died before it wrote anything.
     const QString reason = isEmpty ? QStringLiteral("it is empty") : file.failure();
     LogFile::errorf("Study %s cannot be read from %s: %s", studyUID.constData(), qUtf8Printable(path),
                     qUtf8Printable(reason));
@@ -81,6 +82,7 @@ bool readTagFile(const QString& path, TagFile& file)
 
 QList<QByteArray> ownPlaces(const GlobalOptions& options)
 {
+    // Folders end in a slash, files do not.
     QList<QByteArray> places = {absolutePath(TagFile::metaFolder()) + '/',
                                 absolutePath(pathBytes(options.volumeFolder())) + '/'};
     const QByteArray address = Kxg::DatabaseServer();

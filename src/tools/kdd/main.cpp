@@ -59,6 +59,7 @@ Outcome run(int argc, char** argv)
     try {
         app.parse(argc, argv);
     } catch (const CLI::ParseError& fault) {
+        // Help and version end the parsing like an error, but with 0.
         return app.exit(fault) == 0 ? Outcome::Done : Outcome::WrongUsage;
     }
     // It comes without a command.
@@ -69,6 +70,7 @@ Outcome run(int argc, char** argv)
         return Outcome::WrongUsage;
     }
     const GlobalOptions& options = global.apply();
+    // Until here an interrupt simply ends the process.
     CommandProgress::catchInterrupts();
     return whenWritten(chosen(options));
 }
