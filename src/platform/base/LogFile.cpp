@@ -18,6 +18,7 @@ namespace Kdd
 namespace
 {
 
+// So the files take 40 MiB at most.
 constexpr std::size_t kRotatedSize = 10 * 1024 * 1024;
 constexpr std::size_t kRotatedFiles = 3;
 
@@ -149,6 +150,7 @@ std::string lineOf(const char* format, va_list arguments)
     if (original.find('\n') == std::string::npos)
         return LogFile::escaped(formatted(format, arguments));
     std::string marked = original;
+    // Any character would do that is no part of a conversion.
     std::replace(marked.begin(), marked.end(), '\n', '|');
     va_list again;
     va_copy(again, arguments);
@@ -158,6 +160,7 @@ std::string lineOf(const char* format, va_list arguments)
     return escapedBut(text, [&](std::size_t i) { return other.size() == text.size() && other[i] == '|'; });
 }
 
+/// Asked before a line is put together, which costs far more than the question.
 bool isWanted(LogFile::Severity severity, const char* category)
 {
     const Settings& current = settings();
@@ -231,6 +234,7 @@ std::string LogFile::escaped(const std::string& text)
 void LogFile::setLevel(Level level)
 {
     settings().level = level;
+    // Whoever wants it otherwise says so afterwards.
     settings().isDebugWanted = level >= Level::Timing;
 }
 

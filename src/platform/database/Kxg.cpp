@@ -26,6 +26,7 @@ struct StudyFiles
     std::set<std::string> withVolume;  // series, in the order of their bytes
 };
 
+/// All in the caller's transaction, so that the lists belong together whatever is registered meanwhile.
 StudyFiles readFiles(SqlConnection& connection, int studyId)
 {
     StudyFiles files;
@@ -63,6 +64,7 @@ DicomDirectoryEntry volumeEntry(const DicomDirectoryEntry& series, const QByteAr
     DicomDirectoryEntry file;
     file.type = DicomDirectoryEntry::VolumeFile;
     file.flags = DicomDirectoryEntry::HasVolume;
+    // The directory shows names; the path itself is asked for with the files of the study.
     file.name = path.mid(path.lastIndexOf('/') + 1);
     file.studyInstanceUID = series.studyInstanceUID;
     file.seriesInstanceUID = series.seriesInstanceUID;
@@ -82,6 +84,7 @@ void readSeries(SqlConnection& connection, qint64 studyId, DicomDirectoryEntry& 
 void readVolumes(SqlConnection& connection, qint64 studyId, DicomDirectoryEntry& study)
 {
     QHash<QByteArray, DicomDirectoryEntry*> bySeries;
+    // The list of series does not grow from here on, so the places in it stay.
     for (DicomDirectoryEntry& series : study.entries)
         bySeries.insert(series.seriesInstanceUID, &series);
     for (const ListedVolume& volume : listVolumes(connection, studyId))
@@ -173,6 +176,7 @@ Kdd::Result GetSeries(const QByteArray& studyUID, QMap<QByteArray, std::shared_p
 bool IsDamagedFile(const char* path)
 {
     Kdd::FileStatus status;
+    // Without a database no file was taken with tolerance.
     if (DatabaseServer().isEmpty() || !Kdd::statusOf(path, status))
         return false;
     bool isDamaged = false;

@@ -17,6 +17,7 @@ namespace
 
 QByteArray joined(const QSet<QByteArray>& texts)
 {
+    // A set has no order, and lists are to be the same each time.
     QList<QByteArray> sorted = texts.values();
     std::sort(sorted.begin(), sorted.end());
     return sorted.join(' ');
@@ -82,6 +83,7 @@ SqlCatalogue::SqlCatalogue(const DatabaseAddress& address, SqlConnection::IfAbse
     // An empty file, or one of something else, is not made into a database that should be there already.
     if (ifAbsent == SqlConnection::IfAbsent::Fail)
         requireSchema(mConnection);
+    // Also in a database that was there: tables of an older program are changed, those of a newer one refused.
     bringSchemaUpToDate(mConnection);
 }
 
@@ -249,6 +251,8 @@ Kdd::Result SqlCatalogue::listStudies(std::vector<StudySummary>& studies)
             StudySummary& study = list.back();
             if (!rows.text(6).isEmpty())
                 modalities.insert(rows.text(6));
+            // Put together again with each series, since the last row of a study does not show that it is the
+            // last.
             study.modalities = joined(modalities);
             study.images += static_cast<int>(rows.number(7));
             study.volumes += static_cast<int>(rows.number(8));
@@ -283,6 +287,7 @@ Kdd::Result SqlCatalogue::volumeFiles(const QByteArray& studyUID, QVector<QByteA
                                        {textValue(studyUID)});
         while (rows.next())
             found.push_back(rows.bytes(0));
+        // The database knows nothing of part numbers.
         std::sort(found.begin(), found.end(), Kdd::isEarlierPart);
         paths.swap(found);
     });

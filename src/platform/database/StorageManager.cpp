@@ -34,6 +34,7 @@ QByteArray StorageManager::getMetaFolder()
 
 Kdd::Result StorageManager::retrieveStorageVolumes()
 {
+    // By number, since the bytes of the names would put the tenth before the second.
     QMap<int, QByteArray> volumes;
     Kdd::Result result = askDatabase([&](SqlConnection& connection) {
         SqlRows rows =

@@ -56,6 +56,7 @@ QVariantList description(const DicomFileRecord& record, const Attribute (&attrib
 
 void describeStudy(SqlConnection& connection, qint64 studyId, const DicomFileRecord& image)
 {
+    // One text for all calls, because statements are prepared once and kept by their texts.
     static const QByteArray kDescribe = describing("study", kStudyAttributes);
     connection.change(kDescribe, description(image, kStudyAttributes, studyId));
 }

@@ -32,6 +32,7 @@ bool isPlainText(const QByteArray& bytes)
 
 QString pathText(const QByteArray& bytes)
 {
+    // Nearly every name: it stays readable, and Qt's own classes find it.
     if (isPlainText(bytes))
         return QFile::decodeName(bytes);
     QString text;

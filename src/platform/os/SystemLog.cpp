@@ -29,6 +29,7 @@ int priorityOf(LogFile::Severity severity)
 
 void writeToSystemLog(LogFile::Severity severity, const char* category, const std::string& line)
 {
+    // Before each line, since the system's log may put others between them.
     const std::string prefix = *category != '\0' ? std::string("[") + category + "] " : std::string();
     // Line by line: the system's log would write a line feed as a number, and all in one line.
     for (std::size_t start = 0; start <= line.size();) {

@@ -66,6 +66,7 @@ Values readFile()
     if (!QFileInfo::exists(path) && !isNamed)
         return {};
     QSettings file(path, QSettings::IniFormat);
+    // Qt would take Latin-1 otherwise, whatever the locale is.
     file.setIniCodec("UTF-8");
     Values values;
     const QStringList keys = file.allKeys();
@@ -162,6 +163,7 @@ QByteArray ExResource::tlsCaFile()
 
 int ExResource::readPatience()
 {
+    // Ten minutes [ms].
     return numberOf(kReadPatience, 600000);
 }
 

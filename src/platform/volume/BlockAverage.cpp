@@ -102,6 +102,7 @@ TypedData2D averageBlocks(const TypedData2D& pixels, int factor, double blank, M
 
 TypedData2D scaleValues(const TypedData2D& pixels, double slope, double intercept)
 {
+    // The values keep their type then, and the copy shares their bytes.
     if (slope == 1 && intercept == 0)
         return pixels;
     TypedData2D scaled = pixels;

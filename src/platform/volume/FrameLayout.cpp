@@ -77,6 +77,7 @@ Result readFrameLayout(DcmItem& dataset, FrameLayout& layout)
 {
     layout.rows = numberOf(dataset, DCM_Rows, 0);
     layout.columns = numberOf(dataset, DCM_Columns, 0);
+    // Where it is absent the image is grey.
     layout.samples = numberOf(dataset, DCM_SamplesPerPixel, 1);
     layout.frames = numberOfFrames(dataset);
     // Float images have an element of their own in place of Pixel Data, and it tells the bits.
@@ -86,6 +87,7 @@ Result readFrameLayout(DcmItem& dataset, FrameLayout& layout)
     layout.bitsStored = numberOf(dataset, DCM_BitsStored, layout.bitsAllocated);
     layout.highBit = numberOf(dataset, DCM_HighBit, layout.bitsStored - 1);
     layout.isSigned = numberOf(dataset, DCM_PixelRepresentation, 0) == 1;
+    // Of a single sample the attribute means nothing.
     layout.isPlanar = layout.samples == 3 && numberOf(dataset, DCM_PlanarConfiguration, 0) == 1;
     const auto* whole = dynamic_cast<DcmDataset*>(&dataset);
     layout.isBigEndian = whole && whole->getOriginalXfer() == EXS_BigEndianExplicit;

@@ -87,6 +87,7 @@ ValueRange windowOf(const ImageAttributes& attributes)
     const QByteArray function = shaped ? textOf(*shaped, DCM_VOILUTFunction) : QByteArray();
     // The linear function spreads a width less 1; the other functions take any width above 0.
     const bool isLinear = function.isEmpty() || function == "LINEAR";
+    // Of centres and widths there should be as many; what has no partner is passed over.
     for (int i = 0; i < qMin(centers.size(), widths.size()); ++i) {
         if (isLinear ? widths.at(i) >= 1 : widths.at(i) > 0)
             return windowRange(centers.at(i), widths.at(i));

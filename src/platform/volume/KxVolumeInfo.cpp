@@ -43,6 +43,7 @@ QVector<int> candidates(int frames)
 
 bool isBlank(const TypedData2D& pixels)
 {
+    // One value throughout shows nothing, whatever it is.
     const ValueRange range = rangeOf(pixels);
     return !(range.lowest < range.highest);
 }
@@ -55,6 +56,7 @@ Result readRepresentative(DcmDataset& dataset, int least, int& number, StoredFra
     for (const int candidate : candidates(numberOfFrames(dataset))) {
         StoredFrame read;
         const Result reading = readStoredFrame(dataset, candidate, least, read);
+        // The first reason is told: the frames after it mostly fail for the same one.
         if (reading.bad() && result.good())
             result = reading;
         const bool showsMore = reading.good() && (!isFound || !isBlank(read.pixels));
@@ -63,12 +65,14 @@ Result readRepresentative(DcmDataset& dataset, int least, int& number, StoredFra
             frame = read;
             isFound = true;
         }
+        // No more is decoded than it takes.
         if (isFound && !isBlank(frame.pixels))
             break;
     }
     return isFound ? Result() : result;
 }
 
+/// Either says so; with both it is said twice and not undone.
 bool isInverted(DcmDataset& dataset)
 {
     return textOf(dataset, DCM_PhotometricInterpretation) == "MONOCHROME1" ||

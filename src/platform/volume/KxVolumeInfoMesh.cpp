@@ -25,6 +25,7 @@ bool isShowable(const TypedData2D& pixels)
 ValueRange paddingOf(const ParamBundle& parameters)
 {
     const auto range = parameters.numbers("PaddingRangeMin") + parameters.numbers("PaddingRangeMax");
+    // Both limits or none, and they take the place of the single value.
     if (range.size() == 2)
         return {range.at(0), range.at(1)};
     const auto value = parameters.numbers("PaddingValue");

@@ -66,6 +66,7 @@ Result decodeRle(const QByteArray& bytes, const FrameLayout& layout, StoredFrame
     const int width = qMax(1, layout.bitsAllocated / 8);
     const int step = width * layout.samples;
     const QVector<qint64> bounds = readSegments(bytes);
+    // The number of segments is told by the header and by the dataset, which must agree.
     if (bounds.size() != step + 1)
         return damaged(QStringLiteral("segments do not match %1 bytes per pixel").arg(step));
 

@@ -32,6 +32,7 @@ Result readPalette(DcmItem& dataset, Palette& palette)
         {DCM_GreenPaletteColorLookupTableDescriptor, DCM_GreenPaletteColorLookupTableData},
         {DCM_BluePaletteColorLookupTableDescriptor, DCM_BluePaletteColorLookupTableData}};
     Uint16 representation = 0;
+    // The first number of a table is signed when the pixels are.
     dataset.findAndGetUint16(DCM_PixelRepresentation, representation);
     for (size_t i = 0; i < palette.size(); ++i) {
         Result result = readLookupTable(dataset, channels[i].descriptor, channels[i].data,

@@ -53,6 +53,7 @@ QByteArray unshuffled(const QByteArray& planes, int elementSize)
 
 QByteArray deflated(const QByteArray& content)
 {
+    // One for each call, because they must not be shared between threads.
     const std::unique_ptr<libdeflate_compressor, Free> compressor(libdeflate_alloc_compressor(kLevel));
     if (!compressor)
         return {};

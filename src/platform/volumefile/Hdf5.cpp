@@ -114,6 +114,7 @@ Result openMember(hid_t group, const QByteArray& name, Handle& object)
     H5O_info_t info = {};
     if (H5Oget_info2(object.id(), &info, H5O_INFO_HDR) < 0)
         return libraryFailure(failedFor("cannot examine \"%1\"", name));
+    // Damage to metadata without checksums goes unnoticed until the library follows it.
     if (info.hdr.version < kChecksummedHeader)
         return Result::failure(failedFor("\"%1\" has no checksum", name));
     return {};

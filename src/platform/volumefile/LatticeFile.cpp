@@ -13,6 +13,7 @@ namespace
 /// The number of components, and whether they have a dimension of their own.
 Result readComponents(const ChunkedData& data, int& components, bool& haveDimension)
 {
+    // Without the attribute the last dimension is that of the columns.
     haveDimension = H5Aexists(data.object(), kComponentsAttribute) > 0;
     if (!haveDimension)
         return {};

@@ -81,6 +81,7 @@ struct KDD_LOCAL OrlanMesh::Private
     Result readCounts(const QByteArray& section, QVector<quint64>& counts) const;
 };
 
+/// The head first: a form of the file that has no checksums never reaches the library.
 Result OrlanMesh::Private::open()
 {
     Result checked = checkHead(*store);
@@ -153,6 +154,7 @@ Result OrlanMesh::Private::readSlice(const QByteArray& latticeName, int slice, T
     if (slice < 0 || slice >= lattice.dims.at(2))
         return Result::failure(QStringLiteral("is not between 0 and %1").arg(lattice.dims.at(2) - 1));
     const ChunkedData& data = latticeData[static_cast<std::size_t>(at)];
+    // A chunk is a slice, so it begins at the slice's number and at 0 in all else.
     QVector<hsize_t> start(data.dims().size(), 0);
     start.first() = static_cast<hsize_t>(slice);
     QByteArray stored;

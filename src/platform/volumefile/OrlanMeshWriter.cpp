@@ -81,6 +81,7 @@ Result OrlanMeshWriter::Private::start()
 
 Result OrlanMeshWriter::Private::checkSlice(int slice, const TypedData2D& pixels) const
 {
+    // finish() has closed it.
     if (!data.isOpen())
         return Result::failure(QStringLiteral("comes after the end"));
     if (slice < 0 || slice >= lattice.dims.at(2))
@@ -143,6 +144,7 @@ Result OrlanMeshWriter::writeParameters(const ParamBundle& parameters)
 {
     const QuietErrors quiet;
     Handle group;
+    // The bounds that readers hold, so that nothing is written that would not be read.
     ParameterBudget budget;
     Result result = createGroup(mPrivate->file.id(), kParametersGroup, group);
     if (result.good())

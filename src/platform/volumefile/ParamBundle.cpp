@@ -18,6 +18,7 @@ QVector<double> Parameter::numbers() const
 
 QByteArray ParamBundle::text(const QByteArray& name) const
 {
+    // What is absent has an empty text, as a parameter of another kind has.
     return mParameters.value(name).text;
 }
 
@@ -35,6 +36,7 @@ double ParamBundle::real(const QByteArray& name, double fallback) const
 int ParamBundle::integer(const QByteArray& name, int fallback) const
 {
     using Limits = std::numeric_limits<int>;
+    // Numbers are accepted as integers and as reals alike.
     const double value = real(name, fallback);
     // Written so that a value that is no number fails it too.
     const bool fits = value >= Limits::min() && value <= Limits::max();

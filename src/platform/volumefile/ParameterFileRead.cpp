@@ -31,6 +31,7 @@ template <typename Number>
 QVector<Number> numbersFrom(const QByteArray& bytes)
 {
     QVector<Number> numbers(bytes.size() / static_cast<int>(sizeof(Number)));
+    // The file's byte order is this machine's, as its types were compared with.
     std::memcpy(numbers.data(), bytes.constData(), static_cast<std::size_t>(numbers.size()) * sizeof(Number));
     return numbers;
 }
