@@ -62,6 +62,7 @@ SamplePicture chestScout()
 {
     SamplePicture picture(kMatrix, kScoutRows, kAir);
     picture.paintAll(kFront);
+    // Ribs over the lungs, which would be plain dark spots without them.
     for (int rib = 0; rib < 7; ++rib) {
         const double y = -0.75 + 0.16 * rib;
         picture.paint({-0.36, y, 0.26, 0.025, -120}).paint({0.36, y, 0.26, 0.025, -120});

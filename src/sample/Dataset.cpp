@@ -28,6 +28,7 @@ void check(const OFCondition& condition, const DcmTag& tag, const QByteArray& va
 {
     if (condition.good())
         return;
+    // Only the head of the value is told, for some are long.
     throw SampleFault(QStringLiteral("The attribute %1 cannot take the value \"%2\": %3")
                           .arg(QString::fromLatin1(tag.toString().c_str()),
                                QString::fromLatin1(value.left(64)), QString::fromLatin1(condition.text())));

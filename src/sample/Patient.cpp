@@ -15,6 +15,7 @@ namespace Kdd
 namespace
 {
 
+// That of the day of the studies.
 constexpr int kThisYear = 2024;
 
 struct Person

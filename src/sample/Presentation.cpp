@@ -67,6 +67,7 @@ void annotate(SampleDataset& dataset, const SampleSeries& series, int instance, 
 {
     SampleDataset annotation = dataset.item(DCM_GraphicAnnotationSequence);
     series.refer(annotation, DCM_ReferencedImageSequence, instance);
+    // By the name of the layer above.
     annotation.with(DCM_GraphicLayer, "MARKS");
     annotation.item(DCM_TextObjectSequence).withAll(kText).with(DCM_UnformattedTextValue, text);
     annotation.item(DCM_GraphicObjectSequence).withAll(kPolyline);

@@ -15,6 +15,7 @@ namespace
 
 constexpr int kColumns = 80;
 constexpr int kRows = 96;
+// One for each value of twelve bits.
 constexpr int kLutEntries = 4096;
 
 const SampleAttribute kMachine[] = {
@@ -26,6 +27,7 @@ const SampleAttribute kMachine[] = {
     {DCM_SoftwareVersions, "2.0"},
     {DCM_BodyPartExamined, "CHEST"},
     {DCM_PresentationIntentType, "FOR PRESENTATION"},
+    // High values are shown dark, as much radiation is on film.
     {DCM_PhotometricInterpretation, "MONOCHROME1"},
     {DCM_BurnedInAnnotation, "NO"},
     {DCM_LossyImageCompression, "00"},

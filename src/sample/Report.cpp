@@ -40,6 +40,7 @@ const char* const kLongFinding = "In the right lower lobe lies a round nodule th
 SampleDataset content(SampleDataset& parent, const char* type, const SampleCode& name)
 {
     SampleDataset item = parent.item(DCM_ContentSequence);
+    // Each item says how it belongs to the one above it, of what kind it is and what it is called.
     item.with(DCM_RelationshipType, "CONTAINS").with(DCM_ValueType, type);
     return item.withCode(DCM_ConceptNameCodeSequence, name);
 }
@@ -76,6 +77,7 @@ void addFindings(SampleDataset& document, const SampleSeries& slices, SampleRand
 
 void addEvidence(SampleDataset& document, const SampleSeries& slices)
 {
+    // What the report refers to is listed once more, below its study and its series.
     SampleDataset study = document.item(DCM_CurrentRequestedProcedureEvidenceSequence);
     study.with(DCM_StudyInstanceUID, slices.study.uid("study"));
     SampleDataset series = study.item(DCM_ReferencedSeriesSequence);

@@ -10,6 +10,7 @@ namespace Kdd
 namespace
 {
 
+/// UIDs and everything random are made of these two names, so another wording would change all of them.
 QByteArray seriesPart(int series)
 {
     return "series " + QByteArray::number(series);

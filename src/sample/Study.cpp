@@ -23,6 +23,7 @@ constexpr qint64 kTicksPerSecond = 10000;
 
 const SampleAttribute kVisit[] = {
     {DCM_InstitutionName, "Sample Clinic"},
+    // Texts of this kind may have line ends.
     {DCM_InstitutionAddress, "1 Hospital Road\r\nNorthfield"},
     {DCM_InstitutionalDepartmentName, "Radiology"},
     {DCM_PhysiciansOfRecord, ""},
@@ -87,6 +88,7 @@ void SampleStudy::describe(SampleDataset& dataset) const
         .with(DCM_AccessionNumber, accessionNumber())
         .with(DCM_RequestingPhysician, patient.physician)
         .withAll(kVisit);
+    // Retired, and met in files all the same.
     dataset.item(DCM_ReferencedStudySequence)
         .with(DCM_ReferencedSOPClassUID, UID_RETIRED_DetachedStudyManagementSOPClass)
         .with(DCM_ReferencedSOPInstanceUID, uid("referenced study"));

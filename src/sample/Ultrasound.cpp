@@ -14,6 +14,7 @@ namespace Kdd
 namespace
 {
 
+// These three also stand in the tables below, which know texts only.
 constexpr int kColumns = 64;
 constexpr int kRows = 48;
 constexpr int kFrames = 4;

@@ -24,6 +24,7 @@ struct Setting
     const char* standard;
 };
 
+// Name in the environment, key in the file, and what counts without either.
 constexpr Setting kWebHost = {"KDD_WEB_HOST", "web/host", "localhost"};
 constexpr Setting kCloudDownload = {"KDD_CLOUD_DOWNLOAD", "cloud/download",
                                     "https://storage-download.googleapis.com/"};

@@ -11,6 +11,7 @@ QVector<double> Parameter::numbers() const
         return reals;
     QVector<double> numbers;
     numbers.reserve(integers.size());
+    // Above 2^53 a real does not tell neighbours apart; whoever needs that takes the integers themselves.
     for (const qint64 value : integers)
         numbers.append(static_cast<double>(value));
     return numbers;

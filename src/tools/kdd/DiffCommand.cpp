@@ -46,6 +46,7 @@ bool readNamed(const QString& name, TagFile& file)
     const QByteArray path = name.toLocal8Bit();
     // What is left out of a damaged file would show as a difference.
     DicomInput input = readDicomInput(path, Damage::Refused);
+    // Into an empty study, of which it is then the only image.
     if (input.kind == DicomInput::Kind::Image)
         return file.addTagMap(input.map.release(), path.constData(), true) != nullptr;
     LogFile::errorf("Could not load %s: %s", qUtf8Printable(name), qUtf8Printable(input.reason));
@@ -103,6 +104,7 @@ private:
     {
         ++mCount;
         if (mOptions.json) {
+            // Kept until the end, since the result is one value.
             mList.append(QJsonObject{{QStringLiteral("image"), displayText(image)},
                                      {QStringLiteral("path"), displayText(difference.path)},
                                      {QStringLiteral("name"), displayText(difference.name)},

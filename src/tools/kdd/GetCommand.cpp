@@ -86,6 +86,7 @@ private:
 
     PartialFile::Origin origin()
     {
+        // As this response tells of it.
         return {mRequest.url, ObjectVersion::of(mStream.httpStatus()), mStream.contentLength()};
     }
 
@@ -107,6 +108,7 @@ bool Fetch::hasContent()
 
 bool Fetch::begin()
 {
+    // A part that cannot be continued is no fault: the object is then fetched anew.
     if (!goOn() && !beginAnew())
         return false;
     mDone = mResumedAt;

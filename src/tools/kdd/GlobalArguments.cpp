@@ -66,6 +66,7 @@ void GlobalArguments::addTo(CLI::App& app)
 
 const GlobalOptions& GlobalArguments::apply()
 {
+    // First, so that whatever is logged from here on is written as it was asked for.
     applyLogging();
     applyStore();
     return mOptions;

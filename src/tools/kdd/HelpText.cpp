@@ -16,6 +16,7 @@ std::string wrapped(const std::string& text)
     std::string lines;
     std::string word;
     for (std::size_t column = 0; words >> word; column += word.size()) {
+        // A word that does not fit together with the blank before it begins a line.
         const bool isNewLine = column > 0 && column + 1 + word.size() > kWidth;
         if (column > 0)
             lines += isNewLine ? '\n' : ' ';
@@ -50,6 +51,7 @@ std::string HelpText::make_option_opts(const CLI::Option* option) const
 std::string HelpText::make_subcommand(const CLI::App* command) const
 {
     std::ostringstream out;
+    // The list of commands has the summaries only; the details come with a command's own help.
     CLI::detail::format_help(out, command->get_name(), summaryOf(*command), get_column_width());
     return out.str();
 }

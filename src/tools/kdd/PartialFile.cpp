@@ -141,6 +141,7 @@ bool PartialFile::publish(bool flush)
 
 void PartialFile::removeIfEmpty()
 {
+    // Still under the lock, so nobody else is fetching into it.
     if (mFile.isOpen() && mFile.size() == 0) {
         QFile::remove(recordPath());
         QFile::remove(path());

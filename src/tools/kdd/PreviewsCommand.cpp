@@ -29,6 +29,7 @@ Outcome runPreviews(const GlobalOptions& options, const PreviewsRequest& request
     QList<QByteArray> named = request.names;
     // The parser cannot tell studies and folder apart. There is a last value, since one is required.
     const QString folder = pathOf(named.takeLast());
+    // With --all there is the folder alone, without it one study at least.
     if (request.all != named.isEmpty()) {
         LogFile::errorf("Name the studies whose previews to export, or --all");
         return Outcome::WrongUsage;

@@ -35,6 +35,7 @@ void printTable(const QList<QStringList>& rows)
         for (int i = 0; i < row.size(); ++i) {
             if (i >= widths.size())
                 widths.append(0);
+            // In characters and not in bytes, so that names in other scripts line up as well.
             widths[i] = qMax(widths.at(i), row.at(i).size());
         }
     }
