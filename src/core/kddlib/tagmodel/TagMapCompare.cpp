@@ -63,6 +63,7 @@ bool TagMap::compare(const TagMap& other, bool strict, std::string* diffs) const
             append(diffs, text(mine) + " <> " + text(theirs) + "\n");
             return false;
         }
+        // Only the value of a private attribute is passed over. That one side lacks it has been found above.
         const bool isPassedOver = !strict && (mine.key().getGroup() & 1) != 0;
         if (!isPassedOver && !mine.value()->compare(*theirs.value(), strict, diffs)) {
             if (diffs != nullptr)
