@@ -51,6 +51,8 @@ bool isAscii(const QString& text)
                        [](QChar c) { return c.unicode() < 0x80 && c.unicode() != 0x1b; });
 }
 
+/// By the end of the name, which a set has in common with and without code extensions. The
+/// underscore of "ISO_IR" counts as a blank.
 const CharacterSet* findCharacterSet(QByteArray name)
 {
     name.replace('_', ' ');
@@ -86,6 +88,8 @@ bool encodePart(const QString& part, const QByteArray& characterSet, QByteArray&
         const CharacterSet* set = findCharacterSet(names.at(i).trimmed());
         if (set == nullptr)
             continue;
+        // Where the first value is empty it stands for ASCII, which
+        // was tried above; all others are switched to.
         bytes = encodedWith(*set, i == 0, part);
         if (decodeText(bytes, characterSet) == part)
             return true;
@@ -115,6 +119,7 @@ bool encodeText(const QString& text, const QByteArray& characterSet, QByteArray&
             all += static_cast<char>(text.at(i).unicode());
         start = i + 1;
     }
+    // As a whole once more: a two-byte set that one part switches to would hide the delimiters behind it.
     if (decodeText(all, characterSet) != text)
         return false;
     bytes = all;

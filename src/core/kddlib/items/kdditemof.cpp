@@ -34,6 +34,7 @@ ItemOF::ItemOF(std::shared_ptr<DcmDataset> dataset)
 {
 }
 
+/// Asks for the form in which the pixels were read; a decoder may have added another one since.
 bool ItemOF::isEncapsulated()
 {
     DcmPixelData* pixels = findPixelData(*mItem);

@@ -88,6 +88,7 @@ std::unique_ptr<TagElement> newElement(VrCode vr, const QByteArray& text)
     return element;
 }
 
+/// US where the dictionary leaves the sign open: texts are converted to numbers that have one or have none.
 VrCode dictionaryVr(const DcmTagKey& key)
 {
     const DcmEVR evr = DcmTag(key).getEVR();
@@ -162,6 +163,7 @@ OFCondition ItemTM::findAndGetOFString(const DcmTagKey& key, OFString& value)
     const std::unique_ptr<DcmElement> copy = elementForText(*element, key);
     if (copy == nullptr || copy->getOFString(value, 0).bad()) {
         value = textForm(*element);
+        // Without a backslash the position is larger than any text.
         value.resize(std::min(value.find('\\'), value.size()));
     }
     return EC_Normal;
@@ -272,6 +274,7 @@ Item* SequenceOfItemsTM::getItem(unsigned int index)
         return nullptr;
     if (mItems.size() <= index)
         mItems.resize(index + 1U);
+    // Made when it is first asked for, and kept: callers are promised the same pointer.
     std::shared_ptr<ItemTM>& item = mItems[index];
     if (item == nullptr)
         item = std::make_shared<ItemTM>(*mSequence->item(static_cast<int>(index)));
