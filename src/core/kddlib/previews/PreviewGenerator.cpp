@@ -21,6 +21,7 @@ namespace
 {
 
 constexpr float kNoTensor = 0.001F;  // marks pixels of a tensor image where none was measured
+// Six floats.
 constexpr int kTensorBytes = 24;
 constexpr float kVeryLarge = 1e10F;
 
@@ -48,6 +49,7 @@ class Window
 public:
     Window(float lowest, float highest)
         : mLowest(lowest)
+        // A range of one value has no steps: all of it is black.
         , mScale(highest == lowest ? 0 : 255 / (highest - lowest))
     {
     }
@@ -271,6 +273,7 @@ QImage PreviewGenerator::convertToQImage(const KxVolumeInfo* info, float center,
     if (converter == nullptr || image.isNull())
         return {};
     image.fill(Qt::black);
+    // A negative width has white at the low end.
     const float half = (info->isInverted() ? -width : width) * 0.5F;
     converter(*info, Window(center - half, center + half), image);
     return image;

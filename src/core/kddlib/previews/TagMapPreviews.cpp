@@ -58,6 +58,7 @@ QByteArray TagMap::findPreviewData(TagMap** owner)
     QByteArray preview = previewOf(*this);
     const bool isStudy = mParent == nullptr;
     const bool isSeries = !isStudy && mParent->mParent == nullptr;
+    // Only a study or a series looks below itself: an image without preview has nothing there.
     if (preview.isEmpty() && (isStudy || (isSeries && !mChildren.isEmpty()))) {
         if (const Volume* volume = largestVolume(isStudy ? mChildren : QList<TagMap*>{this})) {
             preview = volume->previewData();
