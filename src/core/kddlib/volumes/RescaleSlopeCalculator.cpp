@@ -89,6 +89,7 @@ float RescaleSlopeCalculator::rescaleIntercept() const
     return mAllEqual ? mFirstIntercept : mPhysMin;
 }
 
+/// How many times finer the finest image steps than the buffer does, as a power of two.
 float RescaleSlopeCalculator::precisionBitLoss() const
 {
     if (mAllEqual || mMinAbsSlope >= std::fabs(step()))

@@ -131,6 +131,7 @@ void readPadding(StackFrame& frame)
         return;
     value = asStored(value, frame.isSigned);
     limit = frame.hasPaddingRange ? asStored(limit, frame.isSigned) : value;
+    // The limit may lie below the value as well as above it.
     frame.paddingMin = qMin(value, limit);
     frame.paddingMax = qMax(value, limit);
 }

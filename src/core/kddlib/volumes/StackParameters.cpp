@@ -166,6 +166,7 @@ bool isLossy(const TagMap& image)
     return image.findAndGetString(DCM_LossyImageCompression, lossy) && lossy.trimmed() == "01";
 }
 
+/// By Overlay Rows, which every plane has, also where its pixels are too long to be kept.
 int overlayPlanesOf(const TagMap& image)
 {
     int planes = 0;
@@ -223,6 +224,7 @@ void insertWindow(ParamBundle& parameters, const StackFrame& slice, const StackV
     const QVector<double> widths = numbersOf(slice.tags.text(group, DCM_WindowWidth));
     if (centers.isEmpty() || widths.isEmpty() || widths.first() <= 0)
         return;
+    // The image gives its window in physical values; the file counts in values of the lattice.
     const double center = (centers.first() - values.bias()) / values.scale();
     parameters.insert("WindowCenter", Parameter::ofReals({center}));
     parameters.insert("WindowWidth", Parameter::ofReals({widths.first() / std::fabs(values.scale())}));

@@ -60,6 +60,7 @@ bool isNear(double a, double b)
     return std::fabs(a - b) <= kSameSpacing * a;
 }
 
+/// A volume file names its slices either by images or by frames, so the two are never in one stack.
 bool areOfOneKind(const StackFrame& a, const StackFrame& b)
 {
     return a.columns == b.columns && a.rows == b.rows && a.isMultiFrame == b.isMultiFrame &&
@@ -78,6 +79,7 @@ QVector<StackFrames> groupedByKind(const QVector<StackFrame>& frames, QVector<Le
 {
     QVector<StackFrames> groups;
     for (const StackFrame& frame : frames) {
+        // With the first of a group, so that small differences do not add up from slice to slice.
         const auto isOfKind = [&](const StackFrames& group) { return areOfOneKind(*group.first(), frame); };
         const auto group = std::find_if(groups.begin(), groups.end(), isOfKind);
         if (group != groups.end())
@@ -116,6 +118,7 @@ QVector<StackFrames> partedByReference(const QVector<StackFrames>& groups, QVect
     return result;
 }
 
+/// Of at least two frames. Single steps are rounded; over a run that evens out.
 Vec3d meanStep(const StackFrames& run)
 {
     return (run.last()->position - run.first()->position) * (1.0 / (run.size() - 1));

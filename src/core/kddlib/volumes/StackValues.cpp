@@ -138,6 +138,8 @@ int StackValues::mapped(const StackFrame& slice, int stored) const
     if (slice.hasPadding && stored >= slice.paddingMin && stored <= slice.paddingMax)
         return 0;
     const double exact = (stored * slice.slope + slice.intercept - mBias) / mScale;
+    // Less than one beyond the ends is rounding, which is brought back
+    // below; what is no number is outside as well.
     if (!(exact > -1 && exact < mHighest + 1))
         return mLowest - 1;
     return qBound(mHasPadding ? 1 : 0, static_cast<int>(std::lround(exact)), mHighest);

@@ -48,6 +48,7 @@ private:
     {
         if (slice.imageUID == mOpenUID && !mOpenUID.isEmpty())
             return {};
+        // First of all: a file that fails on the way must not count as the open one.
         mOpenUID.clear();
         const QByteArray path = mPathOf(slice.tags.image());
         if (path.isEmpty())
@@ -137,6 +138,8 @@ Result writeStack(const Stack& stack, const ImagePath& pathOf, const QByteArray&
     if (!writer)
         return result;
 
+    // Range and histogram are known when all slices are written, so the parameters come after them. A
+    // writer that is not finished leaves no file.
     ValueCounts counts;
     result = writeSlices(stack, pathOf, values, *writer, counts);
     if (result.good())

@@ -21,6 +21,7 @@ namespace
 
 constexpr int kSixteenBitBuffer = 2;
 constexpr int kDefaultBitsStored = 8;
+// A tag file has two bytes for the number of bins and four for what is in each.
 constexpr int kMaxHistogramBins = 0x10000;
 constexpr quint64 kMaxHistogramTotal = quint64(1) << 32;
 
@@ -132,6 +133,8 @@ SliceList::SliceList(const QVector<Slice>& slices)
 {
     if (slices.isEmpty())
         return;
+    // A list that does not begin with image 0 can only descend; whether
+    // it is a run at all is seen slice by slice.
     const SliceList run = ofRun(slices.first().image == 0 ? Run::Ascending : Run::Descending, slices.size());
     for (int i = 0; i < slices.size(); ++i) {
         if (slices.at(i).image != run.at(i).image || slices.at(i).frame != 0) {
@@ -315,6 +318,7 @@ void Volume::setMultiFrameInfo(const std::vector<std::string>& frameIdentifiers)
     if (frameIdentifiers.empty()) {
         slices.resize(order.size());
         for (int i = 0; i < order.size(); ++i)
+            // The slices are those of the volume file, in its order; only the numbers of the images change.
             slices[order.at(i).position].image = i;
     }
     // Of several images of one UID the last answers.
@@ -350,6 +354,7 @@ void Volume::attachImages(int volumeIndex, const QVector<TagMap*>& images)
     setImages(images, nullptr);
     if (numImages() == 0 || !hasSignedPixels(*image(0)))
         return;
+    // A record has 16 bits for each and no sign: only the images tell whether their values have one.
     extendSign(mPaddingValue);
     extendSign(mPaddingRangeLimit);
 }
@@ -363,6 +368,7 @@ bool Volume::arrangeLike(const QVector<TagMap*>& images)
     QHash<TagMap*, int> places;
     for (int i = 0; i < order.size(); ++i)
         places.insert(order.at(i), i);
+    // As sets: the same images in another order are what this is for.
     if (QSet<TagMap*>(former.begin(), former.end()) != QSet<TagMap*>(order.begin(), order.end()))
         return false;
     QVector<Slice> slices;

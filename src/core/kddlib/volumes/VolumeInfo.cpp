@@ -88,6 +88,7 @@ KxHistogram histogramOf(const OrlanMesh& mesh, const QByteArray& path)
     if (result.good() && range.size() == 2)
         return {counts, range.at(0), range.at(1)};
     const Lattice* lattice = mesh.findLattice(kLevel0, 3);
+    // A range that is there but is none is not guessed at; one that is missing may follow from the type.
     if (result.good() && range.isEmpty() && lattice != nullptr) {
         KxHistogram histogram = ofEveryValue(counts, lattice->type);
         if (histogram.numBins() > 0)
@@ -132,6 +133,7 @@ bool VolumeInfo::readHeader(const OrlanMesh& mesh, const QByteArray& path)
     numOverlayPlanes = parameters.integer("NumberOfOverlayPlanes", 0);
     paddingValue = optionalInteger(parameters, "PaddingValue");
     if (parameters.contains("PaddingRangeMin") && parameters.contains("PaddingRangeMax")) {
+        // A range takes the place of the single value.
         paddingValue = optionalInteger(parameters, "PaddingRangeMin");
         paddingRangeLimit = optionalInteger(parameters, "PaddingRangeMax");
     }
@@ -155,6 +157,7 @@ void VolumeInfo::nameImages(bool haveFrames)
     imageUIDs.clear();
     for (const std::string& identifier : frameIdentifiers) {
         const std::string uid = withoutFrame(identifier);
+        // Each image once, in the order of its first frame.
         if (seen.insert(uid).second)
             imageUIDs.push_back(uid);
     }
