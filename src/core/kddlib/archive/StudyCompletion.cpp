@@ -65,9 +65,11 @@ CompletedStudy StudyCompletion::reduce(Kxg::StudyClaim& claim)
     // The removal itself has left one request.
     if (mContents.changes.size() > 1 || !isTrusted(studyUID) ||
         !present.readWhenFreeForStudy(studyUID.constData(), true) || !holdsListed(TagFile(), present)) {
+        // Held alone so far; the build takes the lock itself.
         present.close();
         return build(claim, TagFile());
     }
+    // Whatever is not listed goes, so that a removal that died half way is completed as well.
     const std::vector<QByteArray> gone = unlisted(present);
     std::vector<const char*> keys;
     keys.reserve(gone.size());
@@ -142,6 +144,8 @@ bool StudyCompletion::canMerge(const QByteArray& studyUID, const TagFile& arriva
     // A file of the same path and image may have been registered with other content.
     const bool isAlone = std::all_of(mContents.changes.begin(), mContents.changes.end(),
                                      [&](qint64 request) { return requests.contains(request); });
+    // What costs least is asked first: whether the tag file is the one written last, and what it holds, only
+    // when nothing else speaks against merging.
     return isAlone && arrivals.studyInstanceUID() == studyUID && isTrusted(studyUID) &&
            present.readWhenFreeForStudy(studyUID.constData(), false) && holdsListed(arrivals, present) &&
            std::all_of(arrivals.imagesByUID().keyBegin(), arrivals.imagesByUID().keyEnd(),
@@ -173,6 +177,7 @@ std::vector<QByteArray> StudyCompletion::unlisted(const TagFile& present) const
 
 CompletedStudy StudyCompletion::merge(Kxg::StudyClaim& claim, TagFile& arrivals, TagFile& present)
 {
+    // Previews are chosen among all images of the study, so what is there goes along.
     TagFileGenerator().completeArrivals(arrivals, present);
     bool isMerged = arrivals.mergeIntoCacheFile();
     for (int i = 1; i < kMergeAttempts && !isMerged && arrivals.wasLockedOut(); ++i)
