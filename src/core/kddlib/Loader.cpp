@@ -115,6 +115,7 @@ bool readTagFile(TagFile& file, const QByteArray& studyUID)
 
 bool hasFilePath(const TagMap& image, const char* path)
 {
+    // Only the image's own path counts; one that it inherits may be shared with others.
     const TagElement* held = image.tagsForLevel().value(kFilePath, nullptr);
     const uint length = qstrlen(path);
     return held != nullptr && held->vr() == VrCode::LO && static_cast<uint>(held->value().size()) == length &&
@@ -206,9 +207,12 @@ Volume* Loader::loadVolume(const char* path, const QByteArray& seriesUID, const 
         return nullptr;
     const QByteArray name = baseName(path);
     const int part = partNumberOf(name);
+    // The first volume's file has no part in its name, the second one's is part 2.
     const int index = part < 0 ? 0 : part - 1;
     const QByteArray suffix = Volume::fileNameSuffix(name.constData());
     Volume* volume = index >= 0 ? volumeOfSuffix(*series, suffix, index) : nullptr;
+    // One that only bears the file's name does not answer: without a suffix
+    // the tag file keeps none of a volume's values.
     if (volume != nullptr && volume->fileNameSuffix() == suffix) {
         // The tree as well as the tag file, which may be given another tree by whoever added it.
         mLent.insert(file.study());
