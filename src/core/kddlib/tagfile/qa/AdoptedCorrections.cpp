@@ -47,6 +47,9 @@ Result AdoptedCorrections::finish()
     return mRequest != 0 ? mCatalogue->finishRequests({mRequest}) : Result();
 }
 
+/// Looks an image that has a log up in the database, by what it shows and then by what it was. Where the
+/// database tells the same or more there is nothing to do; where the log goes on from there, or the database
+/// knows nothing, the rest is recorded; where the two part, the database counts.
 void AdoptedCorrections::look(const TagMap& image)
 {
     AuditLog log;
@@ -91,6 +94,7 @@ bool AdoptedCorrections::identify(const TagMap& image, const AuditLog& log, Imag
     const QByteArray path = filePathOf(image);
     DcmFileFormat file;
     identity = identityBefore(log, identity, path);
+    // Without the file the log has to tell what the image was.
     if (loadDicomFile(path.constData(), file).bad())
         return true;
     const std::unique_ptr<TagMap> loaded(TagMap::createTagMap(file.getDataset(), kDefaultValueBound));
@@ -131,6 +135,7 @@ bool AdoptedCorrections::isToBeKept(const TagMap& image, const AuditLog& log, co
     if (isListed(identity, path))
         return true;
     if (mResult.good()) {
+        // The file is not listed here, so that its path is only known from the image.
         leaveUndecided(image, "it does not list the image in the study that it was moved from");
         mUndecided.insert(path);
     }

@@ -41,6 +41,7 @@ public:
             }
         }
         requireValue();
+        // For the last Tag; the others are asked when the next one begins.
         return !mXml.hasError();
     }
 
@@ -171,6 +172,7 @@ bool QAData::parseText(const QString& xml, QString& message)
 template <typename Xml>
 bool QAData::take(const Xml& xml, QString& message)
 {
+    // Before the reader sees a byte of it.
     if (xml.size() > kMaxJobXml) {
         message = QStringLiteral("A job of %1 bytes is longer than %2").arg(xml.size()).arg(kMaxJobXml);
         return false;
