@@ -19,7 +19,9 @@ namespace Kdd
 namespace
 {
 
+// The clock counts steps of 100 ns.
 constexpr qint64 kTicksPerSecond = 10'000'000;
+// A token that is handed out has to last for the request that takes it along.
 constexpr qint64 kMargin = 500 * kTicksPerSecond;
 constexpr qint64 kTokenRequestLifetime = 3600;  // [s]
 constexpr double kLongestLifetime =
@@ -146,6 +148,7 @@ QByteArray KxGoogleAuth::Private::takeAnswer(const QJsonDocument& answer, qint64
 {
     const QString token = answer.object().value(QLatin1String("access_token")).toString();
     const QString type = answer.object().value(QLatin1String("token_type")).toString();
+    // Without a lifetime the token counts as expired: it serves this request, and the next one asks anew.
     const double lifetime = answer.object().value(QLatin1String("expires_in")).toDouble();
     // The former token stays: until its own margin it is as good as before.
     if (!isHeaderText(token) || !isHeaderText(type)) {

@@ -13,7 +13,9 @@ namespace Kdd
 namespace
 {
 
+// The parser asks for a few bytes at a time.
 constexpr qint64 kWindow = 64 * 1024;
+// For what the parser steps back over.
 constexpr qint64 kHistory = 4 * 1024;
 
 makeOFConditionConst(EC_EndOfFile, OFM_dcmdata, 0x310, OF_error, "End-of-file reached on input operation");
@@ -114,6 +116,7 @@ bool DownloadProducer::fillWindow()
 qint64 DownloadProducer::readBeyondWindow(char* to, qint64 count)
 {
     const qint64 got = fetch(to, count);
+    // These bytes lie behind the window, whose new content is their end.
     mWindowStart = windowEnd();
     keepHistory(to, got);
     if (got < count)

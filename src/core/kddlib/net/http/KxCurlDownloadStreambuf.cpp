@@ -59,6 +59,7 @@ KxCurlDownloadRequest* KxCurlDownloadStreambuf::currentRequest()
 
 void KxCurlDownloadStreambuf::fetchWhole()
 {
+    // A new request without range; the one that it replaces has delivered nothing.
     mRequests.front() = std::make_unique<KxCurlDownloadRequest>(mOrigin, std::nullopt);
 }
 
