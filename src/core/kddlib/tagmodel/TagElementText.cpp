@@ -186,6 +186,7 @@ void TagElement::getValueAsStringFromOBOW(QByteArray& out, int type) const
     }
 }
 
+/// Numbers that the VR cannot hold are not refused here but cut; who corrects values checks them before.
 bool TagElement::putValueAsString(const QByteArray& text)
 {
     if (isTextVr(mVr)) {

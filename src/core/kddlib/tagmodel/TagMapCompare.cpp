@@ -42,6 +42,8 @@ void append(std::string* diffs, const std::string& line)
 
 }  // namespace
 
+/// Both views are in key order and are walked side by side, so a key that
+/// only one of them has is met there at once.
 bool TagMap::compare(const TagMap& other, bool strict, std::string* diffs) const
 {
     const iterator last = end();

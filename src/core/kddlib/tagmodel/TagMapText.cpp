@@ -105,6 +105,7 @@ private:
         mOut << ' ' << name << '\n';
     }
 
+    /// As a dump tells it: bytes are one value however many they are.
     static int multiplicity(const TagElement& element, bool isText)
     {
         if (element.value().isEmpty())

@@ -167,7 +167,7 @@ void TagMap::addChildMap(TagMap* child, Level level)
     }
     // The UID is taken out first: the node above has one of another image, or must not receive this one's.
     TagElement* uid = child->removeUID(level);
-    // All that a series without images knows it has from images, so the first one brings everything. An item
+    // The first image of a series brings all that the series is to say, in place of what stood there. An item
     // has values of its own, which its sequence shows.
     if (mChildren.isEmpty() && !mIsSequenceItem)
         adoptFrom(child);
