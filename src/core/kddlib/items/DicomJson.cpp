@@ -108,6 +108,8 @@ private:
         isFirst = false;
     }
 
+    /// Of what the node holds only the omitted values have a form of their
+    /// own here; all else stands in the dataset.
     void omitted(const TagMap& map, const TagMap::iterator& source, const std::string& address, bool& isFirst)
     {
         if (!source.value()->markedAsOmitted() || !isWanted(map, source.key()))

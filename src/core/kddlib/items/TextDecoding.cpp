@@ -102,6 +102,7 @@ void forItems(DcmItem& item, Visit visit)
     }
 }
 
+/// At any depth, for one such item is enough.
 bool itemsDeclareCharacterSets(DcmItem& item)
 {
     bool found = false;
@@ -111,6 +112,7 @@ bool itemsDeclareCharacterSets(DcmItem& item)
     return found;
 }
 
+/// Whether the bytes have changed; binary values and empty ones never do.
 bool convertElement(DcmElement& element, const QByteArray& characterSet)
 {
     char* text = nullptr;

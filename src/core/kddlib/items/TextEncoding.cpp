@@ -109,6 +109,8 @@ bool encodeText(const QString& text, const QByteArray& characterSet, QByteArray&
     QByteArray all;
     QByteArray part;
     int start = 0;
+    // Part by part, because each begins in the first character set
+    // again, whatever the one before was switched to.
     for (int i = 0; i <= text.size(); ++i) {
         if (i < text.size() && !isDelimiter(text.at(i)))
             continue;

@@ -235,6 +235,7 @@ OFCondition ItemTM::findAndGetSequence(const DcmTagKey& key, SequenceOfItems*& s
     if (!element->isSequence())
         return EC_InvalidVR;
     auto* found = static_cast<TagSequence*>(element);
+    // As for a dataset: asked for a second time, the same object is handed out.
     auto at = std::find_if(mSequences.begin(), mSequences.end(),
                            [found](const auto& held) { return held->tagSequence() == found; });
     if (at == mSequences.end())
