@@ -162,6 +162,7 @@ Result readOrientation(StackFrame& frame)
     const QVector<double> c = numbersOf(text);
     if (c.size() != 6)
         return refuse("Image Orientation (Patient)", text);
+    // The row's direction is only brought to length 1. The column's loses what it has of the row's.
     const Vec3d row{c[0], c[1], c[2]};
     const Vec3d column{c[3], c[4], c[5]};
     if (!isUnit(row) || !isUnit(column) || std::fabs(dot(row, column)) > kDirectionTolerance)
@@ -183,6 +184,7 @@ Result readSpacing(StackFrame& frame)
         if (value < 1 / kMaxSpacing || value > kMaxSpacing)
             return refuse("Pixel Spacing", text);
     }
+    // DICOM names the distance between rows first, which runs along the columns.
     frame.rowSpacing = spacing[0];
     frame.columnSpacing = spacing[1];
     return {};
@@ -210,6 +212,7 @@ Result readRescale(StackFrame& frame)
     return readNumber(intercept, frame.intercept) ? Result() : refuse("Rescale Intercept", intercept);
 }
 
+/// What a frame has of its own. Of several things that are missing the first is told.
 Result readFrame(StackFrame& frame)
 {
     for (const auto read : {readPosition, readOrientation, readSpacing, readRescale}) {
@@ -227,6 +230,7 @@ LeftOutFrame leftOutFrame(const StackFrame& frame, const QString& reason)
     return {frame.imageUID, frame.isMultiFrame ? frame.frame : -1, reason};
 }
 
+/// What speaks against the image speaks against all its frames, so it is asked once and told once.
 QVector<StackFrame> stackFramesOf(const TagMap& image, QVector<LeftOutFrame>& leftOut)
 {
     const int count = qMax(1, integerOf(image, DCM_NumberOfFrames, 1));

@@ -136,6 +136,7 @@ ParamBundle dicomBundle(const QVector<StackFrame>& slices)
     return bundle;
 }
 
+/// Names each slice by its image, and by its frame where the images have several.
 ParamBundle sopInstances(const QVector<StackFrame>& slices)
 {
     std::vector<std::string> names;
@@ -160,6 +161,7 @@ QVector<const TagMap*> imagesOf(const QVector<StackFrame>& slices)
     return images;
 }
 
+/// An image that was once compressed with loss says so for good, also when it is stored uncompressed now.
 bool isLossy(const TagMap& image)
 {
     QByteArray lossy;
@@ -206,6 +208,7 @@ void insertValues(ParamBundle& parameters, const StackValues& values, const Valu
     parameters.insert("DataWindowScale", Parameter::ofReals({values.scale()}));
     parameters.insert("DataWindowBias", Parameter::ofReals({values.bias()}));
     parameters.insert("PrecisionLossBits", Parameter::ofReals({values.bitLoss()}));
+    // Beside a range, too: a reader that knows of no ranges has this one value.
     if (values.hasPadding())
         parameters.insert("PaddingValue", Parameter::ofIntegers({values.paddingMin()}));
     if (values.hasPaddingRange()) {
@@ -227,6 +230,7 @@ void insertWindow(ParamBundle& parameters, const StackFrame& slice, const StackV
     // The image gives its window in physical values; the file counts in values of the lattice.
     const double center = (centers.first() - values.bias()) / values.scale();
     parameters.insert("WindowCenter", Parameter::ofReals({center}));
+    // A negative scale exchanges the ends of the window, whose width stays one.
     parameters.insert("WindowWidth", Parameter::ofReals({widths.first() / std::fabs(values.scale())}));
 }
 

@@ -132,6 +132,7 @@ double toleranceFor(const Vec3d& step)
 
 bool continues(const StackFrames& run, const StackFrame& next)
 {
+    // One frame goes on with any other: the second makes the step that the third is held against.
     if (run.size() < 2)
         return true;
     const Vec3d step = meanStep(run);
@@ -195,6 +196,8 @@ void widen(double from, double a, double b, double c, float& min, float& max)
     max = static_cast<float>(from + qMax(a, 0.0) + qMax(b, 0.0) + qMax(c, 0.0));
 }
 
+/// The first slice gives size, spacing and directions, in which all of
+/// them agree as far as their group demands.
 Stack stackOf(const StackFrames& run)
 {
     const StackFrame& first = *run.first();
@@ -236,6 +239,9 @@ void planGroup(const StackFrames& group, StackPlan& plan)
 
 }  // namespace
 
+/// Groups the frames of all images by geometry, parts the groups by Frame of Reference and then so that no
+/// two frames of a part lie in one plane, and cuts what is left into runs of equal steps. Each run that is
+/// long enough is a stack; whatever falls out on the way is told with its reason.
 StackPlan planStacks(const TagMap& series, FrameOfReference reference)
 {
     StackPlan plan;

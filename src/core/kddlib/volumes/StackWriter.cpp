@@ -87,6 +87,7 @@ private:
     DcmFileFormat mFile;
 };
 
+/// For messages: the file where there is one, and the frame as people count, from 1.
 QString nameOf(const StackFrame& slice, const ImagePath& pathOf)
 {
     const QString path = QFile::decodeName(pathOf(slice.tags.image()));
@@ -114,6 +115,7 @@ Result writeSlices(const Stack& stack, const ImagePath& pathOf, const StackValue
     return {};
 }
 
+/// Where the slices have no common range the scale is infinite or 0, by which nothing can be divided.
 Result checkPlan(const Stack& stack, const StackValues& values)
 {
     if (std::isfinite(values.scale()) && std::isfinite(values.bias()) && values.scale() != 0)

@@ -92,6 +92,7 @@ bool hasSignedPixels(const TagMap& image)
     return image.findAndGetInt(DCM_PixelRepresentation, representation) && representation == 1;
 }
 
+/// An image that does not say how many bits it stores counts as one of 8.
 void addImage(RescaleSlopeCalculator& calculator, const TagMap& image)
 {
     int bits = 0;
@@ -166,6 +167,7 @@ const QVector<TagMap*>& Volume::images() const
     return mImages.list();
 }
 
+/// The images move together and get other numbers; a slice whose image has left names none.
 void Volume::closeGaps() const
 {
     const QVector<int> places = mImages.closeGaps();
@@ -292,6 +294,7 @@ void Volume::setPadding(const boost::optional<qint32>& value, const boost::optio
     mPaddingRangeLimit = rangeLimit;
 }
 
+/// "1.2-volume_part007.vol" has the suffix "volume_7", and "1.2-volume.vol" has "volume".
 QByteArray Volume::fileNameSuffix(const char* fileName)
 {
     const QByteArray name(fileName);
@@ -329,6 +332,7 @@ void Volume::setMultiFrameInfo(const std::vector<std::string>& frameIdentifiers)
         const QByteArray identifier = QByteArray::fromStdString(each);
         const int dot = identifier.lastIndexOf('.');
         const int frame = dot >= 0 ? identifier.mid(dot + 1).toInt() : 0;
+        // An image that is not held stays unknown, so that the slices after it keep their places.
         slices.append({indexes.value(before(identifier, dot), -1), frame});
     }
     setSlices(slices);

@@ -19,6 +19,8 @@ const char* const kSopInstanceUIDs = "SOPInstanceUIDs";
 const char* const kHistogram = "Histogram";
 const char* const kNumberOfFrames = "G0028-0008";
 
+/// Without a lattice of three dimensions there is no geometry, and the
+/// volume counts as one of which nothing is known.
 Vec3i dimsOf(const OrlanMesh& mesh)
 {
     const Lattice* lattice = mesh.findLattice(kLevel0, 3);
@@ -138,6 +140,7 @@ bool VolumeInfo::readHeader(const OrlanMesh& mesh, const QByteArray& path)
         paddingRangeLimit = optionalInteger(parameters, "PaddingRangeMax");
     }
     histogram = histogramOf(mesh, path);
+    // Told and taken all the same, for the images are known.
     if (dims.z != static_cast<int>(frameIdentifiers.size()))
         LogFile::warnf("Found %d UIDs but %d slices in 3D volume %s",
                        static_cast<int>(frameIdentifiers.size()), dims.z, path.constData());
