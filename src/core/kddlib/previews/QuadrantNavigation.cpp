@@ -91,6 +91,8 @@ Side sideTowards(const QByteArray& patientOrientation, char direction, char oppo
     return Side::Unknown;
 }
 
+/// Pictures from the side have the head's. Seen from above there is none, and the outer half takes its place,
+/// which for the left breast lies to the left of the patient.
 Side upperSide(const Orientation& orientation, const QByteArray& patientOrientation)
 {
     switch (orientation.view) {
@@ -176,6 +178,7 @@ Side chestWallOf(const BreastRegion& breast, Laterality laterality)
     return laterality == Laterality::Left ? Side::Left : Side::Right;
 }
 
+/// The mean position of all pixels of the breast, row by row.
 QPointF centreOf(const BreastRegion& breast)
 {
     double count = 0;
@@ -190,6 +193,7 @@ QPointF centreOf(const BreastRegion& breast)
     return {sumX / count, sumY / count};
 }
 
+/// The middle of the row or column of the breast that lies farthest from the chest wall.
 QPointF tipOf(const BreastRegion& breast, Side chestWall)
 {
     const QRect& box = breast.box();

@@ -32,6 +32,7 @@ const Volume* largestVolume(const QList<TagMap*>& series)
     return largest;
 }
 
+/// The image that a volume's preview shows: it is made of the middle slice.
 TagMap* middleImage(const Volume& volume)
 {
     int frame = 0;
