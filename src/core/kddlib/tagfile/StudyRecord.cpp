@@ -29,6 +29,7 @@ public:
         image.findAndGetString(DCM_SpecificCharacterSet, mCharacterSet);
     }
 
+    /// The database holds texts of all studies, so they are in one encoding there.
     QByteArray operator()(const DcmTagKey& key) const
     {
         QByteArray bytes;

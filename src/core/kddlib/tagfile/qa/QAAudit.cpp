@@ -53,6 +53,7 @@ bool takeLine(const QByteArray& text, int& position, QByteArray& line)
     return true;
 }
 
+/// A line of time, three lines for each change, an empty line.
 bool readEntry(const QByteArray& text, int& position, AuditEntry& entry)
 {
     QByteArray line;
@@ -119,6 +120,7 @@ bool AuditLog::store(TagMap& image) const
 
 bool AuditLog::decode(QVector<AuditEntry>& entries) const
 {
+    // Aside, so that a damaged log gives nothing rather than half of its entries.
     QVector<AuditEntry> read;
     for (int position = 0; position < mText.size();) {
         AuditEntry entry;

@@ -78,6 +78,7 @@ private:
     void readTimestamp()
     {
         const QString text = mXml.readElementText();
+        // As it stands, for the images keep it so.
         mJob.timestamp = text.toLatin1();
         QString time;
         if (!auditTime(mJob.timestamp, time))
