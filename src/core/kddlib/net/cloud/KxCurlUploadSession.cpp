@@ -106,6 +106,8 @@ void KxCurlUploadSession::start()
         throw RetryPolicyExhaustedError(kChunkExhausted, mLastFault);
 }
 
+/// The chunk counts in the checksums once, however often it is sent. Each attempt after the first begins by
+/// asking how far the storage has come, and goes on from there.
 void KxCurlUploadSession::uploadChunk(const QByteArray& data, Chunk kind)
 {
     mChecksums.add(data);
@@ -151,6 +153,7 @@ void KxCurlUploadSession::sendChunk(const QByteArray& rest, Chunk kind)
     // Before it is sent: of a transfer that breaks off all bytes may have come.
     mSentEnd = std::max(mSentEnd, end);
     const int code = exchange("PUT", mSessionUrl, {contentLength(rest.size()), range}, rest);
+    // Any other code leaves the position where it was, so that the attempt counts as failed.
     if (code != kResumeIncomplete && !mIsComplete)
         isInVain(code, kChunk);
     if (!mIsComplete && mNextOffset != end)

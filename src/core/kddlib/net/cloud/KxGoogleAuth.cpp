@@ -126,6 +126,8 @@ Result KxGoogleAuth::Private::makeForm(qint64 now, QByteArray& form) const
     return signing;
 }
 
+/// Signs who the account is and exchanges that for a token. Empty, with the
+/// reason logged, when there is none to be had.
 QByteArray KxGoogleAuth::Private::fetch(const Exchange& exchange, qint64 now)
 {
     QByteArray form;

@@ -163,6 +163,8 @@ std::string KxCurlDownloadRequest::reasonOf(CURLcode code) const
     return cure.empty() ? reason : reason + ". " + cure;
 }
 
+/// Called when curl is done with the transfer, be it well or badly. An answer
+/// without body has not been judged by then.
 void KxCurlDownloadRequest::complete(CURLcode code)
 {
     mDone = true;
