@@ -26,6 +26,7 @@ namespace
 constexpr qint64 kItemHeaderSize = 8;
 constexpr unsigned char kItemTag[] = {0xfe, 0xff, 0x00, 0xe0};
 
+/// Null when the pixel data are not encapsulated, or when there are none.
 DcmPixelSequence* fragmentsOf(DcmFileFormat& file)
 {
     DcmElement* pixelData = nullptr;

@@ -61,6 +61,7 @@ Result readVideo(const char* path, VideoMetaInfo& info)
                                QString::fromUtf8(uid.c_str()));
     info.sopInstanceUID = uid.c_str();
     file.getDataset()->findAndGetSint32(DCM_CineRate, info.cineRate);
+    // Only then is the video looked for, which reads the file once more.
     info.transferSyntax = videoSyntaxOf(file);
     if (info.transferSyntax == 0 || !locateFirstFragment(path, file, info.location))
         return Result::failure(QStringLiteral("it holds no video"));
