@@ -74,6 +74,7 @@ bool namesItself(DcmItem& dataset)
            dataset.tagExistsWithValue(DCM_StudyInstanceUID);
 }
 
+/// What the pixels take of the file, to tell how much of it is header.
 qint64 pixelBytes(DcmItem& dataset)
 {
     qint64 bytes = 0;

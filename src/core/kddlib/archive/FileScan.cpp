@@ -113,6 +113,7 @@ Result FileScan::handOn(DicomInput input, const std::function<Result(DicomInput)
         break;
     case DicomInput::Kind::Volume:
         break;
+    // Handed on as well: the database notes it, so that it is not opened again.
     case DicomInput::Kind::Other:
         ++mSkipped;
         if (mNamesSkipped)

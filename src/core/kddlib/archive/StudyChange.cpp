@@ -50,6 +50,7 @@ void takeOut(const ArchiveNode& node, TagFile& file)
         file.clear();
 }
 
+/// Says what there is not, by the innermost of the names that were given.
 Result absent(const ArchiveNode& node)
 {
     const QString study = QString::fromUtf8(node.study);

@@ -104,6 +104,7 @@ void StudyCheck::checkAll()
     const QString meta = pathText(TagFile::metaFolder());
     const QByteArray folder = absolutePath(TagFile::metaFolder());
     for (const QByteArray& file : filesBelow({folder}, faults)) {
+        // In the form in which the studies' own paths are noted, however the folder was named.
         const QString path = meta + pathText(file.mid(folder.size() + 1));
         if (file.endsWith(".tc") && !known.contains(path))
             others.append(path);
@@ -155,6 +156,8 @@ bool StudyCheck::read(const QByteArray& studyUID, TagFile& file)
     return false;
 }
 
+/// Of a study that does not wait. While one waits, its tag file may differ from
+/// the database, and the build will mend that.
 void StudyCheck::checkListing(const QByteArray& studyUID, const TagFile& file)
 {
     const QString study = textOf(studyUID);

@@ -61,6 +61,8 @@ Result StudyIntake::writeLongestUntouched()
     }));
 }
 
+/// Completes a study and lets go of what was gathered of it, whatever
+/// comes of that: what fails waits in the queue.
 Result StudyIntake::write(Pending::iterator study)
 {
     // Registered before its tag file is touched: what dies on the way leaves a study that waits.
