@@ -42,6 +42,7 @@ bool isNumberText(VrCode vr)
     return vr == VrCode::AS || vr == VrCode::DA || vr == VrCode::DS || vr == VrCode::IS;
 }
 
+/// Index 0 stands for the whole text, which is not split for it: several values are no number then.
 int textAsInt(const QByteArray& text, int index, bool& ok)
 {
     if (index == 0)

@@ -56,10 +56,12 @@ QVector<int> VolumeImages::closeGaps()
 
 void VolumeImages::forget(int place)
 {
+    // The place stays, for slices count by it; gaps are closed together, when the images are next asked for.
     mImages[place] = nullptr;
     mHasGaps = true;
 }
 
+/// Takes this list out of its images, which may live on without it.
 void VolumeImages::release()
 {
     for (TagMap* image : qAsConst(mImages)) {
