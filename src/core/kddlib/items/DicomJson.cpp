@@ -134,6 +134,7 @@ private:
             mOut << (i == 0 ? ",\"Value\":[" : ",");
             object(static_cast<DcmItem&>(*item), source.itemToRead(i), address + '/' + std::to_string(i));
         }
+        // A sequence without items has no member for them.
         mOut << (i > 0 ? "]}" : "}");
     }
 

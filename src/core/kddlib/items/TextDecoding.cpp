@@ -184,6 +184,7 @@ bool convertValuesToUtf8(DcmItem& dataset)
 {
     if (!convertItem(dataset, OFString()))
         return false;
+    // Declared last: until then each value was explained by the set of its item.
     dataset.putAndInsertString(DCM_SpecificCharacterSet, kUtf8CharacterSet);
     declareUtf8InItems(dataset);
     return true;

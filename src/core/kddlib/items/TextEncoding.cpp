@@ -64,6 +64,7 @@ const CharacterSet* findCharacterSet(QByteArray name)
     return found != std::end(kCharacterSets) ? found : nullptr;
 }
 
+/// Empty where Qt lacks the codec; no text that has to be written is read back from that.
 QByteArray encodedWith(const CharacterSet& set, bool isFirst, const QString& text)
 {
     const QTextCodec* codec = QTextCodec::codecForName(set.codec);
