@@ -64,6 +64,7 @@ Result checkPixels(const FrameTags& at)
     const QByteArray photometric = at.text(DCM_PhotometricInterpretation);
     const int samples = integerOf(image, DCM_SamplesPerPixel, 1);
     const int bits = integerOf(image, DCM_BitsStored, 0);
+    // Mostly only the marker of pixels that are too long is kept, which is enough to know of them.
     if (image.findElement(DCM_PixelData) == nullptr)
         return refuse("Pixel Data", QByteArray());
     if (photometric != "MONOCHROME1" && photometric != "MONOCHROME2")

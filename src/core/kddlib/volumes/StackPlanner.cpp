@@ -182,6 +182,7 @@ Result checkRun(const StackFrames& run)
     return checkSpacing(run);
 }
 
+/// The columns are the steps along each axis and the origin; they are stored row by row.
 Mat4f matrixOf(const Vec3d& x, const Vec3d& y, const Vec3d& z, const Vec3d& origin)
 {
     const auto f = [](double value) { return static_cast<float>(value); };

@@ -107,6 +107,7 @@ Result writeSlices(const Stack& stack, const ImagePath& pathOf, const StackValue
         if (result.good())
             result = values.convert(slice, stored, lattice, counts);
         if (result.bad())
+            // A fault of the image is told with its file; the writer names the volume file itself.
             return result.within(nameOf(slice, pathOf));
         result = writer.writeSlice(i, lattice);
         if (result.bad())

@@ -34,6 +34,7 @@ QByteArray sopUIDOf(const TagMap& image)
     return uid;
 }
 
+/// In the order that a reader of the tag file restores: by Instance Number and then by UID.
 struct SortedImage
 {
     TagMap* image;
@@ -250,6 +251,7 @@ void Volume::setGeometry(const Vec3i& dims, const Box3f& box, const Mat4f& trans
     mTransformation = transformation;
 }
 
+/// A slope of 0 is none: nothing was set, so it is computed from the images.
 float Volume::rescaleSlope() const
 {
     if (mRescaleSlope == 0)

@@ -50,6 +50,7 @@ Mat4f matrixOf(const ParamBundle& parameters)
     return matrix;
 }
 
+/// A value that is not there is no 0, which might be a measured one.
 boost::optional<qint32> optionalInteger(const ParamBundle& parameters, const char* name)
 {
     if (!parameters.contains(name))
