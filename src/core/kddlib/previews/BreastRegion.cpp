@@ -235,6 +235,7 @@ void BreastRegion::findBox()
     mBox = QRect(QPoint(left, mBox.top()), QPoint(right, mBox.bottom()));
 }
 
+/// A row or a column; `step` is how far its pixels lie apart in the mask.
 BreastRegion::Line BreastRegion::line(int start, int step, int count) const
 {
     Line line;

@@ -25,6 +25,7 @@ constexpr float kNoTensor = 0.001F;  // marks pixels of a tensor image where non
 constexpr int kTensorBytes = 24;
 constexpr float kVeryLarge = 1e10F;
 
+/// What is too large for an int would wrap to a negative bound, which stands for none.
 int toInt(unsigned long size)
 {
     return static_cast<int>(std::min<unsigned long>(size, std::numeric_limits<int>::max()));
@@ -78,6 +79,7 @@ private:
 template <typename T, typename Convert>
 void convertPixels(const KxVolumeInfo& info, QImage& image, Convert convert)
 {
+    // By the bytes of a pixel, which may have more numbers than are shown.
     const int step = info.bytesPerPixel() / static_cast<int>(sizeof(T));
     for (int y = 0; y < image.height(); ++y) {
         const T* from = reinterpret_cast<const T*>(info.pixels() + y * info.rowStride());
