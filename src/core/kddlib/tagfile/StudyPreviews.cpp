@@ -171,6 +171,7 @@ int exportSeries(TagMap& series, const QString& seriesName)
     return count;
 }
 
+/// Of the hash that gives the study's tag file its place.
 QString studyPrefix(const QByteArray& studyUID)
 {
     const QByteArray hash = QCryptographicHash::hash(studyUID + '\n', QCryptographicHash::Md5);

@@ -317,6 +317,7 @@ void Volume::serialize(KxMsg& out, QList<QByteArray>& blobs) const
     writeText(record, mVolumeFileName);
     writeSlices(record, slices(), sliceCode(slices(), numImages(), mDims));
     writePreview(record, mPreviewData, blobs);
+    // Last, and without a mark: a reader knows of it by what is left of the record.
     if (hasExtraData())
         serializeExtraData(record);
     TagMap::writeLength(out, record.size());

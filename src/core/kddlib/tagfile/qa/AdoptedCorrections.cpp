@@ -149,6 +149,7 @@ bool AdoptedCorrections::isListed(const ImageIdentity& identity, const QByteArra
     if (mResult.good())
         mResult = mCatalogue->studyContents(identity.studyUID, contents);
     return std::any_of(contents.images.begin(), contents.images.end(), [&](const Kxg::ListedImage& listed) {
+        // By path or by UID: the study may list another file of the image.
         return listed.path == path ||
                (!listed.sopInstanceUID.isEmpty() && listed.sopInstanceUID == identity.image);
     });

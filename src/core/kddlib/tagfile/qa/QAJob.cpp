@@ -164,6 +164,7 @@ Result QAJob::hold(StoredStudy& study, const QByteArray& studyUID, IfAbsent ifAb
 
 // ---- writing
 
+/// Brings both trees into the state in which they are written.
 void QAJob::tidy()
 {
     // Volumes first: they may give images to a series that is empty so far.

@@ -145,6 +145,8 @@ QASeriesMove* QAJob::takeVolumes(StudyTree& tree, TagMap& series)
     return &mMoves.emplace(key, QAVolumes::takeOut(tree, series)).first->second;
 }
 
+/// Puts the image where its UIDs now say. An image of the same UID that is there may be the same one, brought
+/// by an earlier run; another one is replaced, unless the job itself has given the UID.
 Result QAJob::move(const Edit& edit)
 {
     const bool staysInSeries =

@@ -71,6 +71,7 @@ Result QARecord::claim(const QAData& job)
         return TagFileSettings::cacheFilePathForStudy(a.constData()) <
                TagFileSettings::cacheFilePathForStudy(b.constData());
     });
+    // All are looked up before one is claimed: where the database knows none there is nothing to keep.
     QVector<QByteArray> known;
     for (const QByteArray& uid : qAsConst(uids)) {
         QVector<QByteArray> found;
@@ -267,6 +268,7 @@ Result QARecord::add(const QAImageChange& change, const Kxg::ImageCorrection& fo
         if (each.key != DCM_PixelData)
             overlay.note(*image, each.key);
     }
+    // And what its log tells of earlier corrections, the log itself included.
     overlay.noteLogged(*image);
     const QByteArray seriesUID = overlay.seriesOf(*image);
     mFormer.push_back(former);
