@@ -125,6 +125,7 @@ KxCurlDownloadStream KxCurlClient::Private::get(const std::function<PreparedRequ
     return open(std::move(origin), firstRange);
 }
 
+/// In one piece, because an answer to a body is no object that could be asked for by ranges.
 QJsonDocument KxCurlClient::Private::post(const std::function<PreparedRequest()>& prepare,
                                           const QByteArray& body, KxHttpStatus& status) const
 {

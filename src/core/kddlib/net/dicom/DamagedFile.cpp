@@ -139,6 +139,7 @@ public:
         // Last, because the number of bytes that the frames need stands in other elements.
         if (mNativePixels.end > 0)
             takeNativePixels();
+        // All together once more: what is sound alone must also be so side by side.
         return parse(mSound, mSyntax, file);
     }
 
@@ -263,6 +264,7 @@ OFCondition readDamagedDicomFile(const char* path, DcmFileFormat& file, QString&
 
 OFCondition readAsRegistered(const char* path, DcmFileFormat& file, const OFCondition& strict)
 {
+    // Only for a file that failed is the database asked; sound ones cost it no question.
     if (!Kxg::IsDamagedFile(path))
         return strict;
     QString leftOut;

@@ -40,6 +40,7 @@ DownloadProducer::DownloadProducer(KxCurlDownloadStream&& stream)
 void DownloadProducer::setStream(KxCurlDownloadStream&& stream)
 {
     mStream = std::move(stream);
+    // A page that tells of an error is no object, be it one that could be parsed.
     mStatus = mStream.httpStatus().ok() ? EC_Normal : EC_ReadError;
     mWindow.clear();
     mWindowStart = 0;

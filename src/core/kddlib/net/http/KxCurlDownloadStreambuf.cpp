@@ -63,6 +63,7 @@ void KxCurlDownloadStreambuf::fetchWhole()
     mRequests.front() = std::make_unique<KxCurlDownloadRequest>(mOrigin, std::nullopt);
 }
 
+/// Once, when the first answer has told the length and the version of the object.
 void KxCurlDownloadStreambuf::plan(const ContentRange& first)
 {
     mPlanned = true;
