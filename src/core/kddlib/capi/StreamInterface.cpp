@@ -28,6 +28,7 @@ bool isOk(KxCurlDownloadStream& stream, const char* url)
     return status.ok();
 }
 
+/// What opening an object and opening a range have in common; `open` makes the request.
 template <typename Opening>
 int openStream(const char* url, void** handle, const Opening& open)
 {
@@ -150,5 +151,6 @@ bool DeleteObject(const char* url)
 
 bool StringIsUrl(const char* text)
 {
+    // Takes null and throws nothing, so there is nothing to guard.
     return KxCurlClient::isUrl(text);
 }

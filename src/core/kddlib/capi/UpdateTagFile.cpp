@@ -43,6 +43,7 @@ void removeStaleEntries(const QList<QByteArray>& names)
     }
 }
 
+/// Bytes are in the encoding that their declaration names; a wide text is in none any more.
 bool parse(const QByteArray& xml, QAData& job, QString& message)
 {
     return job.parse(xml, message);
