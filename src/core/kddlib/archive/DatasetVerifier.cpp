@@ -147,6 +147,7 @@ private:
         }
     }
 
+    /// Both sides by the VR of the tag file, so that they can be compared by eye.
     static QByteArray shown(const TagElement& held, const QByteArray& value)
     {
         QByteArray text;

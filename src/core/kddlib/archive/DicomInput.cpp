@@ -98,6 +98,7 @@ qint64 pixelBytes(DcmItem& dataset)
     return bytes;
 }
 
+/// Makes an image of the dataset, unless its UIDs cannot serve as names.
 DicomInput& take(DicomInput& input, DcmFileFormat& file)
 {
     DcmDataset& dataset = *file.getDataset();
@@ -121,6 +122,7 @@ DicomInput& take(DicomInput& input, DcmFileFormat& file)
     return input;
 }
 
+/// Only the header is read, which tells the study and the series.
 DicomInput& takeVolume(DicomInput& input)
 {
     Result result;

@@ -103,6 +103,7 @@ Result StudyCompletion::readContents(Kxg::StudyClaim& claim)
     return result;
 }
 
+/// The file goes first: whatever dies in between leaves a study that waits.
 CompletedStudy StudyCompletion::remove(Kxg::StudyClaim& claim)
 {
     Result result = TagFileGenerator::removeTagFile(claim.studyInstanceUID());
@@ -111,6 +112,7 @@ CompletedStudy StudyCompletion::remove(Kxg::StudyClaim& claim)
     return {result, result.good(), {}};
 }
 
+/// What is loaded already spares the build the reading of those files.
 CompletedStudy StudyCompletion::build(Kxg::StudyClaim& claim, const TagFile& loaded) const
 {
     TagFile whole;
@@ -175,6 +177,7 @@ std::vector<QByteArray> StudyCompletion::unlisted(const TagFile& present) const
     return keys;
 }
 
+/// Tried again only while others hold the file; any other fault would be the same the next time.
 CompletedStudy StudyCompletion::merge(Kxg::StudyClaim& claim, TagFile& arrivals, TagFile& present)
 {
     // Previews are chosen among all images of the study, so what is there goes along.

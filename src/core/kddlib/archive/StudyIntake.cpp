@@ -98,6 +98,7 @@ Result StudyIntake::finish()
     return {};
 }
 
+/// With what has arrived; without arrivals from all files of the study.
 void StudyIntake::complete(const QByteArray& studyUID, PendingStudy* arrivals)
 {
     mCompleted.insert(studyUID);
