@@ -31,6 +31,7 @@ namespace Kdd
 namespace
 {
 
+/// The dataset is taken out of the file object, which goes; the item keeps it alive.
 std::shared_ptr<Item> itemOf(DcmFileFormat& file)
 {
     return std::make_shared<ItemOF>(std::shared_ptr<DcmDataset>(file.getAndRemoveDataset()));
@@ -103,6 +104,8 @@ QByteArray baseName(const QByteArray& path)
     return path.mid(qMax(path.lastIndexOf('/'), path.lastIndexOf('\\')) + 1);
 }
 
+/// Waits as long as the site allows, for whoever asks a loader would
+/// rather wait than hear that there is nothing.
 bool readTagFile(TagFile& file, const QByteArray& studyUID)
 {
     const Stopwatch stopwatch;
@@ -144,6 +147,7 @@ bool Loader::refresh(const QByteArray& studyUID)
 {
     const auto file = std::make_shared<TagFile>();
     const bool isRead = readTagFile(*file, studyUID);
+    // That a file is there and cannot be read is no reason to forget what was known.
     if (!isRead &&
         (file->wasLockedOut() || QFile::exists(TagFile::cacheFilePathForStudy(studyUID.constData()))))
         return false;

@@ -59,6 +59,7 @@ bool StudySources::query(const QByteArray& user, int studyId)
     if (result.bad())
         LogFile::errorf("Database query GetAllFilesOfStudy() failed.");
     else
+        // They also tell the study's UID, by which its images are asked for next.
         result = corrections.read(studyId);
     if (result.good())
         result = queryImages();

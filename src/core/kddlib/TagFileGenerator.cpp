@@ -125,6 +125,8 @@ bool TagFileGenerator::createTagFile(TagFile& tagFile, int studyId, const char* 
     mLoadWatch = mVolumeWatch = mPreviewWatch = {};
     mNumKept = mNumMissing = 0;
     tagFile.clear();
+    // Images come first, for volumes and previews are made of what the tree then holds. Labels and placement
+    // come last, when nothing is added any more.
     StudySources sources(loaded);
     if (!sources.collect(mUser, studyId))
         return false;
@@ -203,6 +205,8 @@ void TagFileGenerator::finishTree(TagFile& tagFile) const
         tagFile.optimizeAll();
 }
 
+/// From the file, and where that cannot be read from the former tag file: an image is not lost
+/// because its file is out of reach for a while.
 void TagFileGenerator::addFile(TagFile& tagFile, const std::string& path, const char* studyInstanceUID,
                                StudySources& sources)
 {
@@ -364,6 +368,7 @@ VolumeInfo* TagFileGenerator::createVolumeInfo(const char* path, QByteArray& ser
     return info.release();
 }
 
+/// Of the middle slice. Of a mammogram the same picture tells where the breast lies.
 void TagFileGenerator::addPreview(OrlanMesh& mesh, const char* path, VolumeInfo& info)
 {
     const StopwatchSum::Running running(mPreviewWatch);
