@@ -69,6 +69,7 @@ int numberAt(const char* at, VrCode vr)
     }
 }
 
+/// Floats are none, whatever their value, and neither are words of which nobody told the sign.
 bool holdsIntegers(VrCode vr)
 {
     return vr == VrCode::OB || vr == VrCode::OW || vr == VrCode::US || vr == VrCode::SS || vr == VrCode::SL ||

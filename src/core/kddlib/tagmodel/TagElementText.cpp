@@ -143,6 +143,7 @@ void TagElement::getValueAsString(QByteArray& out, VrCode vr) const
     case VrCode::OW:
         appendHexNumbers<quint16>(out, mValue, kWordsShown);
         break;
+    // Bytes, look-up tables and whatever has no VR that is known.
     default:
         appendHexNumbers<quint8>(out, mValue, kBytesShown);
         break;

@@ -121,6 +121,7 @@ bool TagMap::removeChildMap(TagMap* child)
     else if (!mChildren.removeOne(child))
         return false;
     child->mIsTakenOut = true;
+    // Volumes belong to this node, and name no image that is not one of its own.
     child->leaveVolumes();
     return true;
 }
