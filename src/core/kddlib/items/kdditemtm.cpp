@@ -202,6 +202,7 @@ OFCondition ItemTM::findAndGetUint16(const DcmTagKey& key, Uint16& value)
         return EC_TagNotFound;
     if (element->value().size() < 2)
         return EC_ValueRepresentationViolated;
+    // By its bits: a signed value comes out as it does from a dataset.
     value = qFromLittleEndian<quint16>(element->value().constData());
     return EC_Normal;
 }
