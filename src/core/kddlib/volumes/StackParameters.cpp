@@ -87,6 +87,7 @@ struct FrameText
     DcmTagKey key;
 };
 
+// Plain images have them as attributes, so they are asked for frame by frame and found in either place.
 const FrameText kFrameTexts[] = {
     {DCM_PlanePositionSequence, DCM_ImagePositionPatient},
     {DCM_PlaneOrientationSequence, DCM_ImageOrientationPatient},
