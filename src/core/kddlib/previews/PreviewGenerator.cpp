@@ -274,6 +274,7 @@ QImage PreviewGenerator::convertToQImage(const KxVolumeInfo* info, float center,
     QImage image(info->width(), info->height(), QImage::Format_RGB32);
     if (converter == nullptr || image.isNull())
         return {};
+    // Pixels of too few numbers are not converted and stay as they are here.
     image.fill(Qt::black);
     // A negative width has white at the low end.
     const float half = (info->isInverted() ? -width : width) * 0.5F;
