@@ -218,6 +218,7 @@ void writeHistogram(KxMsg& out, const KxHistogram& histogram)
 {
     out << shortLimit(histogram.minimum()) << shortLimit(histogram.maximum());
     out << static_cast<quint16>(histogram.numBins());
+    // A volume whose counts do not fit 32 bits has no extra data.
     for (const quint64 bin : histogram.bins())
         out << static_cast<quint32>(bin);
 }
@@ -304,6 +305,7 @@ void TagMap::deserializeVolumes(KxMsg& in, const QList<QByteArray>& blobs)
     }
     QList<Volume*>& held = obtainVolumes();
     for (std::unique_ptr<Volume>& volume : volumes) {
+        // One for each volume, in their order.
         const VolumeShare& share = shares.at(held.size());
         volume->attachImages(share.index, share.images);
         held.append(volume.release());

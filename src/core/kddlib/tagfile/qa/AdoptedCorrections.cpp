@@ -32,6 +32,7 @@ Result AdoptedCorrections::record()
         if (mResult.good())
             look(*image);
     }
+    // Of corrections that could not all be looked at none is recorded: a part would pass for the whole.
     if (mResult.bad() || mFound.empty())
         return mResult;
     QMap<QByteArray, qint64> requests;

@@ -92,6 +92,7 @@ bool BuildCorrections::apply(const Kxg::ImageCorrection& correction, TagMap& ima
 
 bool BuildCorrections::applyTo(TagMap& image, const QByteArray& path) const
 {
+    // By what the file says, which is how the database knows the image.
     const Kxg::ImageCorrection* known = find(identityOf(image, path));
     return known == nullptr || apply(*known, image);
 }

@@ -96,6 +96,7 @@ private:
     void readOldStudy()
     {
         const QByteArray uid = mXml.attributes().value(QLatin1String("OldSUID")).toUtf8();
+        // An OldSUID without text names no study, so it does not speak against another one.
         if (!mJob.oldStudyUID.isEmpty() && !uid.isEmpty() && uid != mJob.oldStudyUID)
             raise(QStringLiteral("OldSUID names a second study, \"%1\"").arg(QString::fromUtf8(uid)));
         if (!uid.isEmpty())
