@@ -192,6 +192,7 @@ bool KxGoogleAuth::loadCredentialsFromJson(const QJsonObject& object, const char
 void KxGoogleAuth::setScopes(const std::vector<std::string>& scopes)
 {
     const std::lock_guard lock(mPrivate->mutex);
+    // The present token is good for what was asked for before, so it is given up.
     mPrivate->scopes = scopes;
     mPrivate->header.clear();
 }
