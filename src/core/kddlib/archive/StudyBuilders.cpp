@@ -21,6 +21,7 @@ BuildTotals StudyBuilders::build(const QVector<QByteArray>& studyUIDs)
     return run(studyUIDs.size(), [&](Kxg::Catalogue& catalogue) { workOnNamed(catalogue, studyUIDs); });
 }
 
+/// Each thread takes the next study when it is done with one, so that a large study holds nobody else up.
 BuildTotals StudyBuilders::run(int expected, const std::function<void(Kxg::Catalogue&)>& work)
 {
     mTotals = {};

@@ -55,6 +55,7 @@ bool StudyStacker::stack(const QByteArray& studyUID)
     return (!mIsChanged || succeeded(StudyCompletion(mCatalogue).build(*claim).result)) && isDone;
 }
 
+/// A series that fails does not keep the others from being stacked; what was made is registered in any case.
 bool StudyStacker::run()
 {
     removeUnfinished();
