@@ -4,6 +4,7 @@ set(KDD_PUBLIC_HEADERS
   core/kddlib/Loader.h
   core/kddlib/TagFileGenerator.h
   core/kddlib/archive/ArchiveDatabase.h
+  core/kddlib/archive/CorrectedDataset.h
   core/kddlib/archive/DicomInput.h
   core/kddlib/archive/FileScan.h
   core/kddlib/archive/FileWalk.h
@@ -18,6 +19,8 @@ set(KDD_PUBLIC_HEADERS
   core/kddlib/capi/kddstream.h
   core/kddlib/capi/kddtagfile.h
   core/kddlib/items/DicomJson.h
+  core/kddlib/items/FrameIndex.h
+  core/kddlib/items/RegularFile.h
   core/kddlib/items/TextDecoding.h
   core/kddlib/items/TextEncoding.h
   core/kddlib/items/kdditem.h

@@ -24,9 +24,11 @@ struct Server::Private
         : http(settings.http, router, observer)
     {
         const QVector<QByteArray> prefix = Router::segmentsOf(settings.prefix);
-        router.add(prefix, std::make_unique<DicomWeb::DicomWebService>(prefix.size(), makeResources()));
+        router.add(prefix,
+                   std::make_unique<DicomWeb::DicomWebService>(prefix.size(), makeResources(archive)));
     }
 
+    ServedArchive archive;
     Router router;
     Unobserved observer;
     Http::HttpServer http;
