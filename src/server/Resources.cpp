@@ -3,7 +3,7 @@
 namespace Kdd
 {
 
-std::vector<std::unique_ptr<DicomWeb::Resource>> makeResources()
+std::vector<std::unique_ptr<DicomWeb::Resource>> makeResources(const ResourceSurroundings& /*surroundings*/)
 {
     std::vector<std::unique_ptr<DicomWeb::Resource>> resources;
     return resources;
