@@ -28,10 +28,13 @@ Outcome runMetadata(const GlobalOptions& /*options*/, const NodeSelection& selec
         return Outcome::Failed;
     QList<const TagMap*> images;
     collectImages(*node, images);
+    DicomImageWriter writer(MetadataForm::Json);
+    QByteArray text;
     const char* separator = "[\n";
     for (const TagMap* image : qAsConst(images)) {
-        std::cout << separator;
-        writeDicomJson(std::cout, *image, bulkDataRoot(*image));
+        text = separator;
+        writer.append(text, *image, QByteArray::fromStdString(bulkDataRoot(*image)));
+        std::cout.write(text.constData(), text.size());
         separator = ",\n";
     }
     std::cout << (images.isEmpty() ? "[]\n" : "\n]\n") << std::flush;
