@@ -1,5 +1,6 @@
 #include "kddlib/tagfile/StoredStudy.h"
 
+#include "kddlib/tagfile/StampedInput.h"
 #include "kddlib/tagfile/format/StudyReader.h"
 #include "kddlib/tagfile/format/StudyWriter.h"
 #include "platform/base/LogFile.h"
@@ -38,6 +39,22 @@ void StoredStudy::optimizeAll()
 
 Result StoredStudy::read(const QString& path, const char* studyUID, bool keepOpen, Reader reader)
 {
+    return readThrough(mFile.device(), path, studyUID, keepOpen, reader);
+}
+
+Result StoredStudy::readStamped(const QString& path, const char* studyUID)
+{
+    mStamp = {};
+    StampedInput input(mFile.device());
+    Result result = readThrough(input, path, studyUID, false, Reader::Serving);
+    if (result.good())
+        mStamp = input.stamp();
+    return result;
+}
+
+Result StoredStudy::readThrough(QIODevice& input, const QString& path, const char* studyUID, bool keepOpen,
+                                Reader reader)
+{
     const Stopwatch stopwatch;
     const QByteArray wanted(studyUID);  // may be that of the study that is let go of now
     mIsLockedOut = false;
@@ -49,7 +66,7 @@ Result StoredStudy::read(const QString& path, const char* studyUID, bool keepOpe
     Result result = open(path, keepOpen, reader);
     if (result.bad())
         return result;
-    QDataStream in(&mFile.device());
+    QDataStream in(&input);
     result = read(in, studyUID != nullptr ? wanted.constData() : nullptr);
     if (result.bad() || !keepOpen)
         mFile.close();
