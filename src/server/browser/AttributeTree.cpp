@@ -9,8 +9,6 @@
 #include <kddlib/TagMap.h>
 #include <kddlib/TagSequence.h>
 
-#include <array>
-
 namespace Kdd::Browser
 {
 namespace
@@ -21,7 +19,10 @@ constexpr const char* kLevelNames[kLevels] = {"study", "series", "image"};
 
 // The items of one number in the sequences of one key, by the level of the nodes that hold these; null where a node has
 // no such item. For the image itself the three nodes.
-using Holders = std::array<const TagMap*, kLevels>;
+struct Holders
+{
+    const TagMap* nodes[kLevels];
+};
 
 /// Who holds what a node shows under a key.
 struct Shown
@@ -36,7 +37,7 @@ using View = QMap<DcmTagKey, Shown>;
 int levelOf(const TagMap& node, const Holders& holders, int fallback)
 {
     for (int level = 0; level < kLevels; ++level)
-        if (holders[level] == &node)
+        if (holders.nodes[level] == &node)
             return level;
     return fallback;
 }
@@ -63,12 +64,13 @@ Holders itemHolders(const Holders& holders, const DcmTagKey& key, int index)
 {
     Holders items = {};
     for (int level = 0; level < kLevels; ++level) {
-        const TagElement* element =
-            holders[level] == nullptr ? nullptr : holders[level]->tagsForLevel().value(key, nullptr);
+        const TagElement* element = holders.nodes[level] == nullptr
+                                        ? nullptr
+                                        : holders.nodes[level]->tagsForLevel().value(key, nullptr);
         if (element == nullptr || !element->isSequence())
             continue;
         const auto& sequence = static_cast<const TagSequence&>(*element);
-        items[level] = index < sequence.numItems() ? sequence.item(index) : nullptr;
+        items.nodes[level] = index < sequence.numItems() ? sequence.item(index) : nullptr;
     }
     return items;
 }
@@ -152,7 +154,7 @@ QJsonObject attributeTree(const TagMap& image)
     const TagMap* study = series == nullptr ? nullptr : series->parent();
     TreeWriter writer;
     const QJsonArray attributes =
-        writer.attributes(image, {study, series, &image}, kLevels - 1, QByteArray());
+        writer.attributes(image, {{study, series, &image}}, kLevels - 1, QByteArray());
     return {{QStringLiteral("attributes"), attributes}, {QStringLiteral("complete"), writer.isComplete()}};
 }
 

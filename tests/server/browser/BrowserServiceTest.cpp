@@ -1,0 +1,1 @@
+#include "server/browser/BrowserService.h"
