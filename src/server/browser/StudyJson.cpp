@@ -58,6 +58,25 @@ int ownCount(const TagMap& node)
     }));
 }
 
+bool isSeries(const TagMap& node)
+{
+    return node.parent() != nullptr && node.parent()->parent() == nullptr;
+}
+
+int numberOf(const TagMap& node)
+{
+    int number = 0;
+    // What has no number comes last.
+    return node.findAndGetInt(isSeries(node) ? DCM_SeriesNumber : DCM_InstanceNumber, number)
+               ? number
+               : std::numeric_limits<int>::max();
+}
+
+QByteArray keyOf(const TagMap& node)
+{
+    return isSeries(node) ? node.uid(TagMap::SeriesLevel) : TagFile::imageKey(node);
+}
+
 bool hasPreview(const TagMap& image)
 {
     const TagElement* preview = image.findElement(kPreview);
@@ -92,25 +111,6 @@ QJsonObject seriesJson(TagMap& series)
             {QStringLiteral("preview"), !series.findPreviewData(nullptr).isEmpty()},
             {QStringLiteral("attributes"), attributes(series, kSeriesAttributes)},
             {QStringLiteral("volumes"), volumes}};
-}
-
-bool isSeries(const TagMap& node)
-{
-    return node.parent() != nullptr && node.parent()->parent() == nullptr;
-}
-
-int numberOf(const TagMap& node)
-{
-    int number = 0;
-    // What has no number comes last.
-    return node.findAndGetInt(isSeries(node) ? DCM_SeriesNumber : DCM_InstanceNumber, number)
-               ? number
-               : std::numeric_limits<int>::max();
-}
-
-QByteArray keyOf(const TagMap& node)
-{
-    return isSeries(node) ? node.uid(TagMap::SeriesLevel) : TagFile::imageKey(node);
 }
 
 }  // namespace
@@ -173,8 +173,7 @@ QJsonObject imageJson(const TagMap& image)
 {
     const TagMap& series = *image.parent();
     const QVector<TagMap*> sorted = sortedChildren(series);
-    const auto place = std::find(sorted.begin(), sorted.end(), &image);
-    const int position = static_cast<int>(place - sorted.begin());
+    const int position = static_cast<int>(std::find(sorted.begin(), sorted.end(), &image) - sorted.begin());
     const auto keyAt = [&](int place) {
         return place < 0 || place >= sorted.size()
                    ? QJsonValue()
