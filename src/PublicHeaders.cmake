@@ -86,6 +86,7 @@ set(KDD_PUBLIC_HEADERS
   platform/os/PathName.h
   platform/os/SystemResult.h
   platform/resources/ExResource.h
+  platform/volume/FrameView.h
   platform/volume/KxCompressedDataMedia.h
   platform/volume/KxHistogram.h
   platform/volume/KxVolumeInfo.h

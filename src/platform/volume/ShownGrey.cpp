@@ -1,6 +1,7 @@
 #include "platform/volume/BlockAverage.h"
 #include "platform/volume/ImageAttributes.h"
 #include "platform/volume/LookupTable.h"
+#include "platform/volume/PixelTypes.h"
 #include "platform/volume/ShownPixels.h"
 #include "platform/volume/StoredFrame.h"
 
@@ -8,6 +9,7 @@
 #include <dcmtk/dcmdata/dcitem.h>
 
 #include <algorithm>
+#include <cmath>
 
 namespace Kdd
 {
@@ -97,11 +99,35 @@ ValueRange paddingOf(const ImageAttributes& attributes, PrimitiveType type)
     return paddingOf(attributes, DCM_PixelPaddingValue, DCM_PixelPaddingRangeLimit, type);
 }
 
+/// The values that go from black to white.
+ValueRange rangeOf(const FrameWindow& window)
+{
+    // Between whole numbers: what is shown of a value is its distance from the lowest one plus half a step, which the
+    // exact function does not know.
+    const double shift = window.function == FrameWindow::Function::LinearExact ? 0.5 : 0;
+    return windowRange(window.center + shift, window.width);
+}
+
+/// No values are black or white then, but all come ever closer to it.
+ShownPixels spreadBySigmoid(const TypedData2D& pixels, const FrameWindow& window)
+{
+    ShownPixels shown{pixels, {0, 1}};
+    shown.pixels.type = PrimitiveType::Float32;
+    allocatePixels(shown.pixels);
+    visitPixelType(pixels.type, [&](auto zero) {
+        const auto* values = valuesOf<decltype(zero)>(pixels);
+        std::transform(values, values + numValues(pixels), valuesOf<float>(shown.pixels), [&](auto value) {
+            return toFloat(1 / (1 + std::exp(-4 * (double(value) - window.center) / window.width)));
+        });
+    });
+    return shown;
+}
+
 }  // namespace
 
-ShownPixels showGrey(DcmItem& dataset, int frame, const StoredFrame& stored, int width, int height)
+ShownPixels showGrey(DcmItem& dataset, const FrameView& view, const StoredFrame& stored)
 {
-    const ImageAttributes attributes(dataset, frame);
+    const ImageAttributes attributes(dataset, view.frame);
     const PrimitiveType type = stored.pixels.type;
     Rescale rescale = rescaleOf(attributes);
     ShownPixels shown{stored.pixels, rangeOf(stored.pixels, paddingOf(attributes, type))};
@@ -114,21 +140,25 @@ ShownPixels showGrey(DcmItem& dataset, int frame, const StoredFrame& stored, int
     }
 
     shown.range = shown.range.scaled(rescale.slope, rescale.intercept);
-    const ValueRange window = windowOf(attributes);
-    const bool hasWindow = window.overlaps(shown.range);
+    const ValueRange window = view.window ? rangeOf(*view.window) : windowOf(attributes);
+    // Whoever asks for a window gets it, and sees that it shows nothing.
+    const bool hasWindow = view.window || window.overlaps(shown.range);
     // It is looked up in after the rescale, so it is signed when those values reach below zero.
     const LookupTable voi =
         tableOf(attributes, DCM_FrameVOILUTSequence, DCM_VOILUTSequence, shown.range.lowest < 0);
     if (!hasWindow && !voi.isEmpty())
-        return reduce({voi.appliedTo(shown.pixels, rescale.slope, rescale.intercept), voi.range()}, width,
-                      height);
+        return reduce({voi.appliedTo(shown.pixels, rescale.slope, rescale.intercept), voi.range()},
+                      view.width, view.height);
     // A window that shows none of the values was made for others, so it would show a black or a white image.
     if (hasWindow)
         shown.range = window;
     // Averaging and rescaling may change places, as both are linear; this way only the small picture is rescaled.
     const ValueRange storedRange = shown.range.scaled(1 / rescale.slope, -rescale.intercept / rescale.slope);
-    const ShownPixels reduced = reduce({shown.pixels, storedRange}, width, height);
-    return {scaleValues(reduced.pixels, rescale.slope, rescale.intercept), shown.range};
+    const ShownPixels reduced = reduce({shown.pixels, storedRange}, view.width, view.height);
+    const TypedData2D values = scaleValues(reduced.pixels, rescale.slope, rescale.intercept);
+    if (view.window && view.window->function == FrameWindow::Function::Sigmoid)
+        return spreadBySigmoid(values, *view.window);
+    return {values, shown.range};
 }
 
 }  // namespace Kdd

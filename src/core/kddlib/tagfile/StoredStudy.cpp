@@ -29,6 +29,7 @@ void StoredStudy::optimizeAll()
     using Mode = TagFileSettings::CompressionMode;
     QByteArray content;
     if (TagFileSettings::debugOption(TagFileSettings::kMeasureUnoptimised))
+        // Serialized for its size alone, which only those who asked for it pay for.
         mFigures.unoptimisedSize = serialize(Mode::None, content).good() ? content.size() : 0;
     const Stopwatch stopwatch;
     mTree.optimize();
@@ -127,6 +128,7 @@ Result StoredStudy::openToRead(const QString& path, Reader reader)
     // Only who holds the file alone may finish the write, and a shared lock cannot be raised without a gap.
     mFile.close();
     Result result = openToHold(path, reader);
+    // Whoever serves others knows what a file means that stayed held, and tells it in his own words.
     if (result.bad() && (!mIsLockedOut || !isServing))
         LogFile::warnf("Could not open %s: %s", qUtf8Printable(path), qUtf8Printable(result.text()));
     return result;
@@ -179,9 +181,12 @@ Result StoredStudy::finishInterruptedWrite()
 Result StoredStudy::write()
 {
     if (mTree.isEmpty())
+        // Reached when the last image was removed from a file that is held;
+        // without one there is nothing to do away with.
         return mFile.isOpen() ? mFile.remove() : Result::failure(QStringLiteral("No images to write"));
     if (!mFile.isOpen())
         return write(TagFileSettings::cacheFilePathForStudy(mTree.studyInstanceUID().constData()));
+    // Readers go by the file's own lengths, so what a longer study left behind the end may stay.
     Result result = writeInto(mFile, Tail::Keep);
     mFile.close();
     return result;
@@ -232,6 +237,7 @@ Result StoredStudy::writeInto(StudyFile& file, Tail tail)
         result = file.write(content, tail);
     if (result.bad()) {
         LogFile::errorf("Could not write %s: %s", qUtf8Printable(file.path()), qUtf8Printable(result.text()));
+        // An empty file that was made only for this would count as one that is just being made.
         file.removeIfNeverWritten();
         return result;
     }
