@@ -50,6 +50,7 @@ set(KDD_PUBLIC_HEADERS
   core/kddlib/tagfile/qa/QAAudit.h
   core/kddlib/tagfile/qa/QAData.h
   core/kddlib/tagfile/qa/QASeriesMove.h
+  core/kddlib/tagmodel/AttributeDifference.h
   core/kddlib/tagmodel/OwnAttributes.h
   core/kddlib/tagmodel/TagElement.h
   core/kddlib/tagmodel/TagMap.h
