@@ -1,0 +1,19 @@
+#pragma once
+
+#include "platform/database/SearchRecord.h"
+
+#include <QByteArray>
+#include <QMultiMap>
+
+namespace Kdd
+{
+
+class TagMap;
+
+/// The first image of each series of a study, by the image's path.
+using FirstImages = QMultiMap<QByteArray, const TagMap*>;
+
+/// What searches know of a study: of each series what its first image says, of the study what the first of all says.
+Kxg::StudySearchRecord searchRecord(const FirstImages& images);
+
+}  // namespace Kdd
