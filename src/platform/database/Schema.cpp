@@ -13,6 +13,7 @@ namespace Kxg
 namespace
 {
 
+// 30 seconds in all, which is how long writers wait for their turn.
 constexpr int kAttempts = 1500;
 constexpr unsigned long kPause = 20;  // [ms]
 
@@ -159,6 +160,8 @@ QString firstRow(SqlConnection& connection, const QString& question)
 int schemaVersion(SqlConnection& connection)
 {
     const SqlDialect& dialect = SqlDialect::of(connection.address().engine);
+    // Looked for in the engine's own list: on a server a question to a missing table would spoil the
+    // transaction.
     if (firstRow(connection, dialect.hasSchema).toInt() == 0)
         return 0;
     return firstRow(connection, QStringLiteral("SELECT version FROM schema_version")).toInt();
@@ -210,6 +213,7 @@ void migrate(SqlConnection& connection)
     const int version = schemaVersion(connection);
     if (version > currentSchemaVersion())
         refuse(version);
+    // All steps in one transaction, so that nobody meets tables that are half changed.
     for (int step = version; step < currentSchemaVersion(); ++step)
         takeStep(connection, step);
 }
@@ -224,6 +228,7 @@ int currentSchemaVersion()
 void bringSchemaUpToDate(SqlConnection& connection)
 {
     const int version = schemaVersion(connection);
+    // Nearly always so, and then nobody waits for a turn to write.
     if (version == currentSchemaVersion())
         return;
     if (version == 0)

@@ -53,9 +53,11 @@ bool isFixedFile(const QString& path)
     const QByteArray folder = file.left(qMax(1, file.lastIndexOf('/')));
     std::error_code error;
     return ::access(file.constData(), R_OK) == 0 && ::access(folder.constData(), W_OK) != 0 &&
+           // The size of an absent log is -1 here, that of an empty one 0.
            std::filesystem::file_size((path + QLatin1String("-wal")).toStdString(), error) + 1 <= 1;
 }
 
+/// The address by which the engine makes no files beside this one and locks nothing.
 QString fixedFile(const QString& path)
 {
     return QLatin1String("file:") + QString::fromLatin1(path.toUtf8().toPercentEncoding("/")) +
@@ -145,6 +147,7 @@ void SqlConnection::reopen()
     mStatements.clear();
     mOpened.reset();
     const SqlDialect& dialect = SqlDialect::of(mAddress.engine);
+    // Opening would only say that no driver is loaded.
     if (!QSqlDatabase::isDriverAvailable(dialect.driver))
         throw DatabaseError(QStringLiteral("Qt's database driver %1 is not installed").arg(dialect.driver));
     if (mAddress.engine == DatabaseAddress::Engine::Sqlite)
@@ -176,7 +179,10 @@ void SqlConnection::begin(Access access)
     try {
         beginOnce(access);
     } catch (const DatabaseError&) {
+        // A connection that was lost since its last use shows here, when no work of the transaction is lost
+        // with it.
         rollBack();
+        // It lives, so the refusal is the engine's own, for example because others write.
         if (isAlive())
             throw;
         reopen();
@@ -198,6 +204,7 @@ void SqlConnection::transact(Access access, const std::function<void()>& work)
         work();
         execute(QStringLiteral("COMMIT"));
     } catch (...) {
+        // Whatever was thrown, no transaction may stay open: the connection is used again.
         rollBack();
         throw;
     }
@@ -212,6 +219,7 @@ QSqlQuery& SqlConnection::run(const QByteArray& sql, const QVariantList& values)
     auto found = mStatements.find(sql);
     if (found == mStatements.end()) {
         QSqlQuery query(mOpened->database);
+        // Rows come one by one and are not kept, since lists may be long.
         query.setForwardOnly(true);
         if (!query.prepare(QString::fromLatin1(sql)))
             throw errorOf(query.lastError());

@@ -9,7 +9,9 @@ SqlDialect sqlite()
 {
     SqlDialect dialect;
     dialect.driver = QStringLiteral("QSQLITE");
+    // [ms]; as long as the server's lock_timeout below.
     dialect.connectOptions = QStringLiteral("QSQLITE_BUSY_TIMEOUT=30000");
+    // Without it the engine passes over what tables refer to.
     dialect.afterOpening << QStringLiteral("PRAGMA foreign_keys = ON");
     // Readers and the writer then do not wait for each other.
     dialect.beforeSchema << QStringLiteral("PRAGMA journal_mode = WAL");
@@ -17,6 +19,7 @@ SqlDialect sqlite()
     // A transaction that began by reading cannot wait for another writer: it would have to be repeated.
     dialect.beginWriting << QStringLiteral("BEGIN IMMEDIATE");
     dialect.hasSchema = QStringLiteral("SELECT COUNT(*) FROM sqlite_master WHERE name = 'schema_version'");
+    // Without the last word the number of a deleted row would be given out again.
     dialect.id = QStringLiteral("INTEGER PRIMARY KEY AUTOINCREMENT");
     // By this very word a key is the row's own number, and needs no index.
     dialect.key = QStringLiteral("INTEGER");
@@ -55,6 +58,7 @@ SqlDialect postgres()
                        " WHERE tablename = 'schema_version' AND schemaname = current_schema()");
     dialect.id = QStringLiteral("BIGINT GENERATED ALWAYS AS IDENTITY PRIMARY KEY");
     dialect.key = QStringLiteral("BIGINT");
+    // In the order of bytes, as with the other engine, whatever language the server was set up for.
     dialect.text = QStringLiteral("TEXT COLLATE \"C\"");
     dialect.bytes = QStringLiteral("BYTEA");
     dialect.bytesOf = QStringLiteral("convert_to(%1, 'UTF8')");

@@ -87,6 +87,7 @@ public:
 
     Kdd::Result finish(const BuiltStudy& built) override
     {
+        // A build that left something out keeps the requests, and with them the study's place in the queue.
         return conclude(built.isComplete ? mStudy.requests : QVector<qint64>(), [&] {
             keep(built);
             if (built.settleAt > 0)
@@ -111,8 +112,10 @@ public:
                 noteChange(mConnection, {ChangeKind::Deleted, mStudy.uid, {}, {}, 0});
             removeSearchRows(mConnection, mStudyId);
             putRegisteredRows(mConnection, mStudyId);
+            // Also for a study that stays because it got files meanwhile: it has no tag file now.
             mConnection.change("UPDATE study SET tag_file_size = 0, tag_file_digest = NULL WHERE id = ?",
                                {mStudyId});
+            // Requests that are still there came after those that are done, and speak of files.
             mConnection.change("DELETE FROM study WHERE id = ?"
                                " AND NOT EXISTS (SELECT 1 FROM series WHERE series.study_id = study.id)"
                                " AND NOT EXISTS (SELECT 1 FROM build_request"
@@ -128,6 +131,7 @@ private:
             // A lock that was lost may be another builder's by now, whose work must not be overwritten.
             mLock->confirm();
             mConnection.transact(SqlConnection::Access::Write, [&] {
+                // First, so that the work finds only requests that came since.
                 deleteRequests(mConnection, done);
                 work();
             });
@@ -235,6 +239,7 @@ public:
             mPassed.insert(studyId);
         std::unique_ptr<StudyClaim> claim;
         qint64 last = 0;
+        // By number and not by counting rows, since requests come and go while the queue is walked.
         for (auto page = pageOfQueue(mConnection, last); !claim && !page.empty();
              page = pageOfQueue(mConnection, last)) {
             last = page.back().id;
@@ -248,6 +253,7 @@ private:
     {
         std::unique_ptr<StudyClaim> claim;
         for (auto request = page.begin(); !claim && request != page.end(); ++request) {
+            // A study may have several requests, but it is tried once.
             if (mPassed.contains(request->studyId))
                 continue;
             mPassed.insert(request->studyId);
@@ -286,6 +292,7 @@ std::unique_ptr<StudyClaim> tryClaim(SqlConnection& connection, std::unique_ptr<
         studyId = ifAbsent == Catalogue::IfAbsent::Create ? findStudyId(connection, studyUID)
                                                           : obtainStudyId(connection, studyUID);
     });
+    // Apart from the search, since a study mostly exists and reading waits for nobody.
     if (studyId == 0)
         connection.transact(SqlConnection::Access::Write,
                             [&] { studyId = obtainStudy(connection, studyUID).id; });
@@ -305,6 +312,7 @@ std::unique_ptr<StudyClaim> tryClaim(SqlConnection& connection, std::unique_ptr<
 Kdd::Result SqlCatalogue::requestBuild(const QVector<QByteArray>& studyUIDs, IfGone ifGone)
 {
     return transact(Access::Write, [&] {
+        // An absent study has the id 0, for which no request is left.
         for (const QByteArray& uid : studyUIDs)
             leaveRequest(mConnection, ifGone == IfGone::PassOver ? findStudyId(mConnection, uid)
                                                                  : obtainStudyId(mConnection, uid));
@@ -340,6 +348,8 @@ Kdd::Result SqlCatalogue::claim(const QByteArray& studyUID, int patienceMs,
     return attempt(mConnection.address(), [&] {
         QElapsedTimer waited;
         waited.start();
+        // One for all attempts, as it may be a connection to a server. The study is looked up each time: its
+        // id may change.
         std::unique_ptr<StudyLock> lock = StudyLock::make(mConnection.address());
         while (!(claim = tryClaim(mConnection, lock, studyUID, ifAbsent)) && waited.elapsed() < patienceMs)
             QThread::msleep(kPause);

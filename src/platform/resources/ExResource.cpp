@@ -24,6 +24,7 @@ struct Setting
     const char* standard;
 };
 
+// Name in the environment, key in the file, and what counts without either.
 constexpr Setting kWebHost = {"KDD_WEB_HOST", "web/host", "localhost"};
 constexpr Setting kCloudDownload = {"KDD_CLOUD_DOWNLOAD", "cloud/download",
                                     "https://storage-download.googleapis.com/"};
@@ -55,6 +56,7 @@ QString filePath()
 Values readFile()
 {
     const QString path = filePath();
+    // Nothing is read then, because Qt would look for a file of another name.
     if (!isPlainText(qgetenv("KDD_CONFIG"))) {
         LogFile::warnf("The settings in %s cannot be read: the name is no text",
                        qgetenv("KDD_CONFIG").constData());
@@ -65,6 +67,7 @@ Values readFile()
     if (!QFileInfo::exists(path) && !isNamed)
         return {};
     QSettings file(path, QSettings::IniFormat);
+    // Qt would take Latin-1 otherwise, whatever the locale is.
     file.setIniCodec("UTF-8");
     Values values;
     const QStringList keys = file.allKeys();
@@ -78,6 +81,7 @@ Values readFile()
 
 QByteArray valueOf(const Setting& setting)
 {
+    // Asked anew each time, while the file is read once.
     QByteArray fromEnvironment = qgetenv(setting.variable);
     if (!fromEnvironment.isEmpty())
         return fromEnvironment;
@@ -88,6 +92,7 @@ QByteArray valueOf(const Setting& setting)
 
 QByteArray endpoint(const Setting& setting)
 {
+    // The bucket's name is put directly behind.
     const QByteArray address = valueOf(setting);
     return address.endsWith('/') ? address : address + '/';
 }
@@ -159,6 +164,7 @@ QByteArray ExResource::tlsCaFile()
 
 int ExResource::readPatience()
 {
+    // Ten minutes [ms].
     return numberOf(kReadPatience, 600000);
 }
 

@@ -32,6 +32,7 @@ Info infoOf(const ShownPixels& shown, double aspect, bool isInverted)
 QVector<int> candidates(int frames)
 {
     QVector<int> numbers;
+    // Six twelfths are the middle, four and eight the ends of the middle third.
     for (const int twelfth : {6, 5, 7, 4, 8}) {
         const auto number = static_cast<int>(qint64(frames) * twelfth / 12);
         if (number < frames && !numbers.contains(number))
@@ -42,6 +43,7 @@ QVector<int> candidates(int frames)
 
 bool isBlank(const TypedData2D& pixels)
 {
+    // One value throughout shows nothing, whatever it is.
     const ValueRange range = rangeOf(pixels);
     return !(range.lowest < range.highest);
 }
@@ -54,6 +56,7 @@ Result readRepresentative(DcmDataset& dataset, int least, int& number, StoredFra
     for (const int candidate : candidates(numberOfFrames(dataset))) {
         StoredFrame read;
         const Result reading = readStoredFrame(dataset, candidate, least, read);
+        // The first reason is told: the frames after it mostly fail for the same one.
         if (reading.bad() && result.good())
             result = reading;
         const bool showsMore = reading.good() && (!isFound || !isBlank(read.pixels));
@@ -62,12 +65,14 @@ Result readRepresentative(DcmDataset& dataset, int least, int& number, StoredFra
             frame = read;
             isFound = true;
         }
+        // No more is decoded than it takes.
         if (isFound && !isBlank(frame.pixels))
             break;
     }
     return isFound ? Result() : result;
 }
 
+/// Either says so; with both it is said twice and not undone.
 bool isInverted(DcmDataset& dataset)
 {
     return textOf(dataset, DCM_PhotometricInterpretation) == "MONOCHROME1" ||
@@ -78,6 +83,7 @@ Info showFrame(DcmDataset& dataset, int width, int height, Result& result)
 {
     int number = 0;
     StoredFrame frame;
+    // By the larger of the two, since a codec halves both sides at once and neither may fall below.
     result = readRepresentative(dataset, qMax(width, height), number, frame);
     if (result.bad())
         return nullptr;
@@ -104,6 +110,7 @@ DcmPixelSequence* findVideo(DcmDataset& dataset)
     E_TransferSyntax xfer = EXS_Unknown;
     DcmPixelSequence* fragments =
         dataset.findAndGetElement(DCM_PixelData, pixels).good() ? findFragments(*pixels, xfer) : nullptr;
+    // Its fragments are one stream, of which no frame can be read alone.
     return isVideo(xfer) ? fragments : nullptr;
 }
 

@@ -24,6 +24,7 @@ void unpackBits(const QByteArray& bytes, int firstBit, TypedData2D& pixels)
     const qint64 count = numValues(pixels);
     for (qint64 i = 0; i < count; ++i) {
         const qint64 bit = firstBit + i;
+        // The first pixel is the lowest bit.
         to[i] = (from[bit / 8] >> (bit % 8)) & 1U;
     }
 }
@@ -80,6 +81,7 @@ void swapWords(QByteArray& bytes)
 
 qint64 nativeFrameBits(const FrameLayout& layout, bool sharesChroma)
 {
+    // Two pixels take four values in place of six.
     const qint64 values = sharesChroma ? layout.numValues() / 3 * 2 : layout.numValues();
     return values * layout.bitsAllocated;
 }
@@ -136,6 +138,7 @@ Result readNativeFrame(DcmElement& pixelData, const FrameLayout& layout, int fra
         return Result::failure(QStringLiteral("Pixel data of %1 bytes end before frame %2 does")
                                    .arg(length)
                                    .arg(qint64(frame) + 1));
+    // Frames of single bits follow each other without padding, so one may begin within a byte.
     const qint64 first = bits * frame / 8;
     const qint64 last = (bits * (qint64(frame) + 1) + 7) / 8;
 

@@ -109,12 +109,14 @@ ShownPixels showGrey(DcmItem& dataset, int frame, const StoredFrame& stored, int
     if (!modality.isEmpty()) {
         shown.pixels = modality.appliedTo(stored.pixels);
         shown.range = rangeOf(shown.pixels);
+        // The table takes the place of the rescale.
         rescale = Rescale();
     }
 
     shown.range = shown.range.scaled(rescale.slope, rescale.intercept);
     const ValueRange window = windowOf(attributes);
     const bool hasWindow = window.overlaps(shown.range);
+    // It is looked up in after the rescale, so it is signed when those values reach below zero.
     const LookupTable voi =
         tableOf(attributes, DCM_FrameVOILUTSequence, DCM_VOILUTSequence, shown.range.lowest < 0);
     if (!hasWindow && !voi.isEmpty())

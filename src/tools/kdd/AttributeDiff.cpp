@@ -13,6 +13,7 @@ namespace
 
 using Report = std::function<void(const AttributeDifference&)>;
 
+/// The value as a difference shows it. Sequences and omitted values have none to show.
 QByteArray describe(const TagMap& node, const TagMap::iterator& it)
 {
     const TagElement& element = *it.value();
@@ -25,6 +26,7 @@ QByteArray describe(const TagMap& node, const TagMap::iterator& it)
     return QByteArray(vrName(element.vr())) + " [" + text + ']';
 }
 
+/// Walks two views side by side, and the items of their sequences likewise.
 class NodeComparison
 {
 public:
@@ -35,6 +37,8 @@ public:
 
     void compare(const TagMap& left, const TagMap& right, const QByteArray& prefix)
     {
+        // Both views are in the order of their keys, so one walk through both finds what either of them
+        // lacks.
         const TagMap::iterator end = left.end();
         TagMap::iterator mine = left.begin();
         TagMap::iterator theirs = right.begin();
@@ -58,6 +62,7 @@ private:
         if (mine != nullptr && theirs != nullptr &&
             !differ(*mine->value(), *theirs->value(), prefix + keyText(key)))
             return;
+        // A private name needs the creator, which stands where the attribute does.
         const TagMap& named = mine != nullptr ? left : right;
         mReport({prefix + keyText(key), keywordOf(named, key), mine != nullptr ? describe(left, *mine) : "-",
                  theirs != nullptr ? describe(right, *theirs) : "-"});
@@ -67,9 +72,11 @@ private:
     bool differ(const TagElement& mine, const TagElement& theirs, const QByteArray& path)
     {
         if (!mine.isSequence() || !theirs.isSequence())
+            // A sequence and a value differ whatever is in them.
             return mine.isSequence() != theirs.isSequence() || !mine.compare(theirs, true, nullptr);
         const auto& left = static_cast<const TagSequence&>(mine);
         const auto& right = static_cast<const TagSequence&>(theirs);
+        // Items have no names, so of different numbers none can be told to belong together.
         if (left.numItems() != right.numItems())
             return true;
         for (int i = 0; i < left.numItems(); ++i)

@@ -39,13 +39,16 @@ void report(const GlobalOptions& options, const BuildTotals& totals)
 
 Outcome runBuild(const GlobalOptions& options, const BuildRequest& request)
 {
+    // With both, the names would have no effect.
     if (request.selection.all && !request.selection.studies.isEmpty()) {
         LogFile::errorf("Name the studies to build, or --all");
         return Outcome::WrongUsage;
     }
+    // An archive that is not there has nothing to build, so none is made.
     const std::unique_ptr<Kxg::Catalogue> database = openExistingDatabase();
     QVector<QByteArray> named;
     int expected = 0;
+    // In this order, so that what is asked for here is in the queue before it is counted.
     if (database == nullptr || !chooseStudies(*database, request.selection.studies, false, named) ||
         (request.settle && !succeeded(database->settleNow())) ||
         (request.selection.all && !succeeded(requestStale(*database, request.again))) ||
@@ -53,8 +56,10 @@ Outcome runBuild(const GlobalOptions& options, const BuildRequest& request)
         return Outcome::Failed;
     CommandProgress progress("Building", !options.quiet);
     StudyBuilders builders(progress, request.jobs, !request.leavesPlaces);
+    // Without names the queue is worked off, which any number of processes do together.
     const BuildTotals totals = named.isEmpty() ? builders.buildWaiting(expected) : builders.build(named);
     report(options, totals);
+    // What was built stays, and what was not goes on waiting.
     const QByteArray finished = QByteArray::number(totals.studies) + " studies are built";
     return !toldOfInterrupt(finished.constData()) && totals.failed == 0 ? Outcome::Done : Outcome::Failed;
 }

@@ -25,23 +25,28 @@ struct DiffRequest
     QString right;
 };
 
+// The first bytes of every tag file.
 constexpr char kTagFileMagic[] = "TaCa";
 
 bool isTagFile(const QString& path)
 {
     QFile file(path);
+    // By what it begins with: copies of tag files may have any name.
     return file.open(QIODevice::ReadOnly) && file.read(4) == kTagFileMagic;
 }
 
 /// Reads what the user names: a tag file, a DICOM file, or a study of the store.
 bool readNamed(const QString& name, TagFile& file)
 {
+    // A file goes before a study of the same name.
     if (!QFileInfo(name).isFile())
         return readStudy(name.toLocal8Bit(), file);
     if (isTagFile(name))
         return readTagFile(name, file);
     const QByteArray path = name.toLocal8Bit();
+    // What is left out of a damaged file would show as a difference.
     DicomInput input = readDicomInput(path, Damage::Refused);
+    // Into an empty study, of which it is then the only image.
     if (input.kind == DicomInput::Kind::Image)
         return file.addTagMap(input.map.release(), path.constData(), true) != nullptr;
     LogFile::errorf("Could not load %s: %s", qUtf8Printable(name), qUtf8Printable(input.reason));
@@ -56,6 +61,7 @@ public:
     {
     }
 
+    /// Image by image, with what each inherits: where a value is stored makes no difference.
     void compare(const TagFile& left, const TagFile& right)
     {
         const auto& mine = left.imagesByUID();
@@ -71,6 +77,7 @@ public:
             else
                 tell(it.key(), {"", "", "image", "-"});
         }
+        // What only the right side has.
         for (auto it = theirs.cbegin(); it != theirs.cend(); ++it) {
             if (!mine.contains(it.key()))
                 tell(it.key(), {"", "", "-", "image"});
@@ -83,6 +90,7 @@ public:
             printJson({{QStringLiteral("differences"), mList}});
         else if (!mOptions.quiet)
             std::printf("%d differences\n", mCount);
+        // A difference is a fault that was found.
         return mCount == 0 ? Outcome::Done : Outcome::Failed;
     }
 
@@ -96,6 +104,7 @@ private:
     {
         ++mCount;
         if (mOptions.json) {
+            // Kept until the end, since the result is one value.
             mList.append(QJsonObject{{QStringLiteral("image"), displayText(image)},
                                      {QStringLiteral("path"), displayText(difference.path)},
                                      {QStringLiteral("name"), displayText(difference.name)},
