@@ -37,6 +37,13 @@ qint64 numberOf(const QByteArray& text)
     return isNumber ? number : kNoNumber;
 }
 
+/// "007" is the number 7.
+QByteArray numberText(const QByteArray& text)
+{
+    const qint64 number = numberOf(text);
+    return number == kNoNumber ? QByteArray() : QByteArray::number(number);
+}
+
 QList<QByteArray> modalitiesOf(const StudySearchRecord& study)
 {
     QSet<QByteArray> found;
@@ -55,7 +62,7 @@ void putSeries(SqlConnection& connection, qint64 studyId, const SeriesSearchReco
                       " description, performed_date, performed_time, instance_count, attributes)"
                       " VALUES (?, ?, ?, ?, ?, ?, ?, ?, ?, ?)",
                       {studyId, textValue(series.uid), textValue(series.modality), numberOf(series.number),
-                       textValue(series.number), textValue(words(series.description)),
+                       textValue(numberText(series.number)), textValue(words(series.description)),
                        textValue(series.performedDate), textValue(series.performedTime), series.instances,
                        bytesValue(series.attributes)});
     for (const auto& request : series.requests)

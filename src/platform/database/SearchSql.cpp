@@ -64,6 +64,8 @@ Column columnOf(SearchColumn column)
         return {"q.scheduled_step", Where::Request, nullptr};
     case SearchColumn::RequestedProcedure:
         return {"q.requested_procedure", Where::Request, nullptr};
+    case SearchColumn::SOPInstanceUID:
+        return {"f.sop_uid", Where::Series, nullptr};
     }
     return {"s.uid", Where::Study, nullptr};
 }
@@ -93,6 +95,8 @@ public:
         const Column column = columnOf(term.column);
         if (term.column == SearchColumn::ModalitiesInStudy)
             addModalities(term);
+        else if (term.column == SearchColumn::SOPInstanceUID)
+            addImages(term);
         else if (column.where == Where::Series || column.where == Where::Request)
             addTo(column.where == Where::Series ? mSeries : mRequest, term, column);
         else
@@ -187,6 +191,16 @@ private:
         }
         append(mStudy, "EXISTS (SELECT 1 FROM study_modality m WHERE m.study_id = s.study_id" + condition + ')',
                values);
+    }
+
+    /// Files that wait to be built in are among them; whoever shows images looks for them in the tag file.
+    void addImages(const SearchTerm& term)
+    {
+        append(mSeries,
+               "(r.study_id, r.uid) IN (SELECT t.study_id, t.uid FROM file f JOIN series t ON t.id = f.series_id"
+               " WHERE f.kind = 1 AND f.sop_uid IN (?" +
+                   QByteArray(", ?").repeated(qMax(1, term.values.size()) - 1) + "))",
+               texts(term.values));
     }
 
     static QVariantList texts(const QVector<QByteArray>& values)

@@ -35,6 +35,7 @@ enum class SearchColumn {
     PerformedTime,
     ScheduledStep,
     RequestedProcedure,
+    SOPInstanceUID,  ///< of an image that the series has
 };
 
 /// One condition. What is set of it holds together.

@@ -2,6 +2,7 @@
 
 #include "kddlib/archive/ArchiveDatabase.h"
 #include "kddlib/archive/WorkObserver.h"
+#include "kddlib/tagfile/SearchAttributes.h"
 #include "kddlib/tagfile/StudyRecord.h"
 #include "kddlib/tagfile/TagFile.h"
 #include "platform/base/LogFile.h"
@@ -33,6 +34,16 @@ bool StudyIndexing::isCurrent(const Kxg::FoundStudy& study)
     FileStatus status;
     return !statusOfTagFile(study.uid, status) || status.size == 0 ||
            (study.isBuilt && status.size == study.tagFile.fileSize && status.modified == study.tagFile.modified);
+}
+
+bool StudyIndexing::isStudyAttribute(const DcmTagKey& key)
+{
+    return isKeptOfStudy(key);
+}
+
+bool StudyIndexing::isSeriesAttribute(const DcmTagKey& key)
+{
+    return isKeptOfSeries(key);
 }
 
 int StudyIndexing::refresh(const std::vector<const Kxg::FoundStudy*>& studies)

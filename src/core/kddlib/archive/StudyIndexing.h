@@ -4,6 +4,10 @@
 #include "platform/base/Result.h"
 #include "platform/database/StudySearch.h"
 
+#include <dcmtk/config/osconfig.h>
+
+#include <dcmtk/dcmdata/dctagkey.h>
+
 #include <vector>
 
 namespace Kdd
@@ -27,6 +31,10 @@ public:
     /// Whether the study's tag file is still the one that was found. So it is when there is none any more: what it showed
     /// is all that is known.
     static bool isCurrent(const Kxg::FoundStudy& study);
+
+    /// Whether answers of studies, or of series, have the attribute from the database.
+    static bool isStudyAttribute(const DcmTagKey& key);
+    static bool isSeriesAttribute(const DcmTagKey& key);
 
     /// Reads the tag files of those studies that are not and takes over what they show. How many studies differ now; a
     /// tag file that cannot be read is told in the log and leaves what was known.

@@ -11,7 +11,8 @@
 
 #include <dcmtk/dcmdata/dcdeftag.h>
 
-#include <memory>
+#include <algorithm>
+#include <iterator>
 #include <sstream>
 
 namespace Kdd
@@ -211,6 +212,16 @@ Kxg::StudySearchRecord searchRecord(const FirstImages& images)
     for (const TagMap* image : images)
         study.series.push_back(seriesRecord(*image));
     return study;
+}
+
+bool isKeptOfStudy(const DcmTagKey& key)
+{
+    return std::find(std::begin(kStudyKeys), std::end(kStudyKeys), key) != std::end(kStudyKeys);
+}
+
+bool isKeptOfSeries(const DcmTagKey& key)
+{
+    return std::find(std::begin(kSeriesKeys), std::end(kSeriesKeys), key) != std::end(kSeriesKeys);
 }
 
 }  // namespace Kdd

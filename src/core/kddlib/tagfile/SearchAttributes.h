@@ -5,6 +5,10 @@
 #include <QByteArray>
 #include <QMultiMap>
 
+#include <dcmtk/config/osconfig.h>
+
+#include <dcmtk/dcmdata/dctagkey.h>
+
 namespace Kdd
 {
 
@@ -15,5 +19,9 @@ using FirstImages = QMultiMap<QByteArray, const TagMap*>;
 
 /// What searches know of a study: of each series what its first image says, of the study what the first of all says.
 Kxg::StudySearchRecord searchRecord(const FirstImages& images);
+
+/// Whether the attribute is among those that are kept of a study, or of a series, where an image has it.
+bool isKeptOfStudy(const DcmTagKey& key);
+bool isKeptOfSeries(const DcmTagKey& key);
 
 }  // namespace Kdd
