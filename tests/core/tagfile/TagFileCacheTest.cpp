@@ -1,5 +1,6 @@
 #include "TagFileFixture.h"
 #include "platform/base/LogFile.h"
+#include "platform/database/TagFileStamp.h"
 #include "support/Process.h"
 
 #include <filesystem>
@@ -75,6 +76,28 @@ TEST_F(TagFileCache, WhatIsWrittenIsFoundByTheDigestOfItsUid)
     EXPECT_EQ(TagFile::cacheFilePathForStudy("1.2.3"),
               QStringLiteral("/meta/e3/16/640a77b2a412ac0fe91cb85078c4.tc"));
     EXPECT_EQ(file.cacheFilePath(), path());
+}
+
+TEST_F(TagFileCache, AStampedReadKnowsTheStateThatWasWritten)
+{
+    const LogCapture log;
+    TagFile file;
+    EXPECT_FALSE(file.readStampedWhenFree(path(), kStudy));
+    EXPECT_TRUE(file.stamp() == Kxg::TagFileStamp());
+    ASSERT_TRUE(put(1, 9, write));
+    const int longest = content().size();
+    ASSERT_TRUE(file.readCacheFileForStudy(kStudy, true));
+    const char* gone[] = {"1", "2", "3"};
+    file.removeImages(3, gone);
+    ASSERT_TRUE(file.writeCacheFile());
+    EXPECT_EQ(content().size(), longest) << "bytes of the former content follow";
+    TagFile again;
+    ASSERT_TRUE(again.readStampedWhenFree(path(), kStudy));
+    EXPECT_TRUE(again.stamp() == file.stamp());
+    EXPECT_FALSE(again.stamp().digest.isEmpty());
+    ASSERT_TRUE(put(10, 10, merge));
+    ASSERT_TRUE(again.readStampedWhenFree(path(), kStudy));
+    EXPECT_FALSE(again.stamp() == file.stamp());
 }
 
 TEST_F(TagFileCache, AnAbsentFileIsWorthALineOnlyToWhoeverDebugs)

@@ -67,7 +67,7 @@ Result StudyIndexing::take(const Kxg::FoundStudy& study, bool& isDone)
     FileStatus after;
     if (!statusOfTagFile(study.uid, before))
         return {};
-    if (!file.readWhenFreeForStudy(study.uid.constData(), false))
+    if (!file.readStampedWhenFree(tagFileOf(study.uid), study.uid.constData()))
         return Result::failure(file.failure());
     Kxg::BuiltStudy present = builtStudy(file);
     // What was written while it was being read is noticed by the next look.

@@ -30,6 +30,8 @@ std::unique_ptr<DcmDataset> rebuilt(const TagMap& map)
     return dataset;
 }
 
+/// As a whole where that can be done. Otherwise the first attempt may have converted half of the values, so
+/// a fresh copy is converted value by value.
 std::unique_ptr<DcmDataset> utf8Dataset(const TagMap& map)
 {
     std::unique_ptr<DcmDataset> dataset = rebuilt(map);
@@ -61,6 +63,8 @@ public:
     {
         mOut << '{';
         bool isFirst = true;
+        // Dataset and map are both in key order. What only the map has was omitted; what only the dataset has
+        // is the character set that the conversion declared.
         const TagMap::iterator end = map.end();
         TagMap::iterator source = map.begin();
         for (DcmObject* next = item.nextInContainer(nullptr); next != nullptr;
@@ -104,6 +108,8 @@ private:
         isFirst = false;
     }
 
+    /// Of what the node holds only the omitted values have a form of their
+    /// own here; all else stands in the dataset.
     void omitted(const TagMap& map, const TagMap::iterator& source, const std::string& address, bool& isFirst)
     {
         if (!source.value()->markedAsOmitted() || !isWanted(map, source.key()))
@@ -120,12 +126,15 @@ private:
     void sequence(DcmSequenceOfItems& sequence, const TagSequence& source, const std::string& address)
     {
         mOut << '"' << name(sequence.getTag()) << "\":{\"vr\":\"SQ\"";
+        // Rebuilding keeps an item that is not there as an empty one, so
+        // items have the same numbers on both sides.
         int i = 0;
         for (DcmObject* item = sequence.nextInContainer(nullptr); item != nullptr;
              item = sequence.nextInContainer(item), ++i) {
             mOut << (i == 0 ? ",\"Value\":[" : ",");
             object(static_cast<DcmItem&>(*item), source.itemToRead(i), address + '/' + std::to_string(i));
         }
+        // A sequence without items has no member for them.
         mOut << (i > 0 ? "]}" : "}");
     }
 

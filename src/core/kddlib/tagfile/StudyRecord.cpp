@@ -29,6 +29,7 @@ public:
         image.findAndGetString(DCM_SpecificCharacterSet, mCharacterSet);
     }
 
+    /// The database holds texts of all studies, so they are in one encoding there.
     QByteArray operator()(const DcmTagKey& key) const
     {
         QByteArray bytes;
@@ -102,6 +103,7 @@ bool isTagFile(const QString& path, const Kxg::TagFileStamp& stamp)
     if (stamp.digest.isEmpty() || hasJournal(path) || file.open(pathBytes(path).constData()).bad() ||
         file.size() < stamp.size)
         return false;
+    // Only as many bytes as were written: what lies behind them is left over and says nothing.
     QByteArray content(static_cast<int>(stamp.size), Qt::Uninitialized);
     return file.readAt(0, content.data(), content.size()) == content.size() &&
            QCryptographicHash::hash(content, QCryptographicHash::Md5) == stamp.digest;

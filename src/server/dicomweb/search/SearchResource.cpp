@@ -65,6 +65,11 @@ Http::Response SearchResource::answer(const Http::Request& request, const Resour
             response = Http::failure(413, run.tooBroad());
             return done;
         }
+        if (run.isHeldUp()) {
+            response = Http::failure(503, QStringLiteral("A study is being written; ask again"));
+            response.addHeader("Retry-After", "1");
+            return done;
+        }
         response = Http::textResponse(200, kOffers.at(offer).name, answers.json());
         addWarnings(search, run, root, response);
         return done;

@@ -143,14 +143,21 @@ Result SearchRun::isBounded(bool& isBounded)
 
 // ---- looking once more
 
-bool SearchRun::holdsImage(const QByteArray& studyUID, const QByteArray& seriesUID) const
+/// Null when there is nothing to look at.
+std::shared_ptr<const ServedStudy> SearchRun::obtain(const QByteArray& studyUID)
+{
+    std::shared_ptr<const ServedStudy> study;
+    const Presence presence = mShelf.find(studyUID, study);
+    mIsHeldUp = mIsHeldUp || presence == Presence::Held;
+    return study;
+}
+
+bool SearchRun::holdsImage(const QByteArray& studyUID, const QByteArray& seriesUID)
 {
     if (mPlan.onImages.empty())
         return true;
-    std::shared_ptr<const ServedStudy> study;
-    if (mShelf.find(studyUID, study) != Presence::Found)
-        return false;
-    return study->look([&](const TagFile& file) {
+    const std::shared_ptr<const ServedStudy> study = obtain(studyUID);
+    return study != nullptr && study->look([&](const TagFile& file) {
         const auto& images = file.imagesByUID();
         return std::any_of(images.begin(), images.end(), [&](const TagMap* image) {
             return (seriesUID.isEmpty() || image->uid(TagMap::SeriesLevel) == seriesUID) &&
@@ -159,7 +166,7 @@ bool SearchRun::holdsImage(const QByteArray& studyUID, const QByteArray& seriesU
     });
 }
 
-bool SearchRun::holds(const Kxg::FoundStudy& study) const
+bool SearchRun::holds(const Kxg::FoundStudy& study)
 {
     return holdAll(mPlan.onStudy, KeptAttributes(study.attributes), mRequest.zone) && holdsImage(study.uid, {});
 }
@@ -267,10 +274,10 @@ Result SearchRun::runPatients(FoundAnswers& answers)
 // ---- images
 
 /// Adds images of a series behind the first `skipped` that hold. How many there are besides `skipped`.
-int SearchRun::addImages(const Kxg::FoundSeries& series, int skipped, int wanted, FoundAnswers& answers) const
+int SearchRun::addImages(const Kxg::FoundSeries& series, int skipped, int wanted, FoundAnswers& answers)
 {
-    std::shared_ptr<const ServedStudy> study;
-    if (mShelf.find(series.study.uid, study) != Presence::Found)
+    const std::shared_ptr<const ServedStudy> study = obtain(series.study.uid);
+    if (study == nullptr)
         return 0;
     return study->look([&](const TagFile& file) {
         const TagMap* held = file.findSeries(series.uid);

@@ -26,6 +26,9 @@ public:
     /// Nothing was looked for, because too much would have to be looked at: why, for the client.
     const QString& tooBroad() const { return mTooBroad; }
 
+    /// Others held a tag file all the time: what was found is not all.
+    bool isHeldUp() const { return mIsHeldUp; }
+
     /// How many more the search would find behind the page; counted up to a bound.
     int remaining() const { return mRemaining; }
     bool isRemainingCut() const { return mIsRemainingCut; }
@@ -40,12 +43,13 @@ private:
     Result findSeries(const Kxg::SearchQuery& query, std::vector<Kxg::FoundSeries>& found);
     Result isBounded(bool& isBounded);
 
-    bool holds(const Kxg::FoundStudy& study) const;
+    bool holds(const Kxg::FoundStudy& study);
     bool holds(const Kxg::FoundSeries& series) const;
-    bool holdsImage(const QByteArray& studyUID, const QByteArray& seriesUID) const;
+    bool holdsImage(const QByteArray& studyUID, const QByteArray& seriesUID);
+    std::shared_ptr<const ServedStudy> obtain(const QByteArray& studyUID);
     void noteRemaining(int remaining);
 
-    int addImages(const Kxg::FoundSeries& series, int skipped, int wanted, FoundAnswers& answers) const;
+    int addImages(const Kxg::FoundSeries& series, int skipped, int wanted, FoundAnswers& answers);
     bool takeImages(const std::vector<Kxg::FoundSeries>& page, int& skipped, FoundAnswers& answers);
 
     const SearchRequest& mRequest;
@@ -53,6 +57,7 @@ private:
     Kxg::StudySearch& mSearch;
     StudyShelf& mShelf;
     QString mTooBroad;
+    bool mIsHeldUp = false;
     int mRemaining = 0;
     bool mIsRemainingCut = false;
 };

@@ -59,6 +59,7 @@ Result QARecord::claim(const QAData& job)
 {
     const QByteArray address = Kxg::DatabaseServer();
     if (address.isEmpty())
+        // Without a database the correction lives in the tag files alone.
         return {};
     Result result;
     std::unique_ptr<Kxg::Catalogue> catalogue = Kxg::Catalogue::open(address, result);
@@ -70,10 +71,12 @@ Result QARecord::claim(const QAData& job)
         return TagFileSettings::cacheFilePathForStudy(a.constData()) <
                TagFileSettings::cacheFilePathForStudy(b.constData());
     });
+    // All are looked up before one is claimed: where the database knows none there is nothing to keep.
     QVector<QByteArray> known;
     for (const QByteArray& uid : qAsConst(uids)) {
         QVector<QByteArray> found;
         if (result.good())
+            // One is enough: before all UIDs that it begins comes the UID itself.
             result = catalogue->findStudies(uid, 1, found);
         if (found.contains(uid))
             known.append(uid);
@@ -138,6 +141,7 @@ Result QARecord::read()
             result = mCatalogue->studyContents(each.first, study.contents);
         if (result.good())
             result = mCatalogue->corrections(each.first, study.corrections);
+        // Asked before the job writes: afterwards the file is another one in any case.
         const Kxg::TagFileStamp& stamp = study.contents.tagFile;
         study.isRecognised = stamp.digest.isEmpty() ||
                              isTagFile(TagFileSettings::cacheFilePathForStudy(each.first.constData()), stamp);
@@ -243,6 +247,7 @@ Result QARecord::record()
             // It came into being after this job had asked for it: now it can be claimed as well.
             if (mStudies.find(change.studyUID) == mStudies.end())
                 return lockedOut(reason);
+            // So that the job can be run when the build is done.
             mCatalogue->requestBuild({change.studyUID}, Kxg::Catalogue::IfGone::PassOver);
             return Result::failure(reason);
         }
@@ -267,6 +272,7 @@ Result QARecord::add(const QAImageChange& change, const Kxg::ImageCorrection& fo
         if (each.key != DCM_PixelData)
             overlay.note(*image, each.key);
     }
+    // And what its log tells of earlier corrections, the log itself included.
     overlay.noteLogged(*image);
     const QByteArray seriesUID = overlay.seriesOf(*image);
     mFormer.push_back(former);
@@ -316,6 +322,7 @@ void QARecord::finish(const StudyTree& tree, const Kxg::TagFileStamp& stamp, con
     } else {
         Kxg::StudyContents left;
         result = mCatalogue->studyContents(studyUID, left);
+        // With volume files left the study stays in the database, but has no tag file.
         const bool isGone = left.images.empty() && left.volumes.isEmpty();
         if (result.good() && isGone)
             result = mCatalogue->finishRequests({request});
