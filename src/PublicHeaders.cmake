@@ -13,6 +13,7 @@ set(KDD_PUBLIC_HEADERS
   core/kddlib/archive/StudyChange.h
   core/kddlib/archive/StudyCheck.h
   core/kddlib/archive/StudyCompletion.h
+  core/kddlib/archive/StudyIndexing.h
   core/kddlib/archive/StudyIntake.h
   core/kddlib/archive/StudyStacker.h
   core/kddlib/archive/WorkObserver.h
@@ -81,7 +82,10 @@ set(KDD_PUBLIC_HEADERS
   platform/database/Catalogue.h
   platform/database/DirectoryEntry.h
   platform/database/Kxg.h
+  platform/database/SearchRecord.h
+  platform/database/SearchText.h
   platform/database/StorageManager.h
+  platform/database/StudySearch.h
   platform/database/TagFileStamp.h
   platform/filecache/ExFileCache.h
   platform/os/ExclusiveFile.h
