@@ -5,6 +5,8 @@
 #include "server/dicomweb/retrieve/BulkDataResource.h"
 #include "server/dicomweb/retrieve/FramesResource.h"
 #include "server/dicomweb/retrieve/InstancesResource.h"
+#include "server/dicomweb/search/ChangeFeed.h"
+#include "server/dicomweb/search/SearchResource.h"
 
 namespace Kdd
 {
@@ -16,6 +18,8 @@ std::vector<std::unique_ptr<DicomWeb::Resource>> makeResources(ServedArchive& ar
     std::vector<std::unique_ptr<Resource>> resources;
     // Viewers ask for frames nine times of ten.
     resources.push_back(std::make_unique<FramesResource>(archive.studies, archive.objects));
+    resources.push_back(std::make_unique<SearchResource>(archive.database, archive.studies));
+    resources.push_back(std::make_unique<ChangeFeed>(archive.database));
     resources.push_back(std::make_unique<InstancesResource>(archive.studies, archive.objects));
     resources.push_back(std::make_unique<BulkDataResource>(archive.studies, archive.objects));
     resources.push_back(std::make_unique<ThumbnailResource>(archive.studies));
