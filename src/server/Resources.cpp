@@ -22,7 +22,7 @@ namespace
 QString answersFolder()
 {
     const QByteArray folder = ExResource::answersFolder();
-    return folder.isEmpty() ? TagFile::metaFolder() + QStringLiteral("/answers") : QFile::decodeName(folder);
+    return folder.isEmpty() ? QFile::decodeName(TagFile::metaFolder()) + QStringLiteral("/answers") : QFile::decodeName(folder);
 }
 
 }  // namespace
