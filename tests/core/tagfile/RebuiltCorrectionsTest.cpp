@@ -55,11 +55,15 @@ TEST_F(RebuiltCorrections, WhatWasMovedAndDeletedDoesNotComeBack)
 TEST_F(RebuiltCorrections, AFileThatArrivesAgainUnderItsFormerStudyFollows)
 {
     correct(move({"a"}, "1", "2", {{DCM_PatientName, QStringLiteral("Roe^R")}}));
-    save(image("a", "1").with(DCM_ImageComments, "sent again"), "again");
+    const DcmTag creator(0x0071, 0x0010, EVR_LO);  // of the block that the log had
+    const DcmTag theirs(0x0071, 0x1021, EVR_LO);
+    save(image("a", "1").with(DCM_ImageComments, "sent again").with(creator, "Other").with(theirs, "theirs"),
+         "again");
     buildAll();
     EXPECT_EQ(imagesIn("1") + imagesIn("2"), (Uids{"b", "c", "a", "z"}));
     EXPECT_EQ(value("2", "a", DCM_PatientName), "Roe^R");
-    EXPECT_EQ(value("2", "a", DCM_ImageComments), "sent again");
+    EXPECT_EQ(value("2", "a", DCM_ImageComments) + value("2", "a", theirs), "sent againtheirs");
+    EXPECT_EQ(value("2", "a", {0x0071, 0x1122}), "20240131120000");
 }
 
 TEST_F(RebuiltCorrections, AnotherJobWaitsUntilTheInterruptedOneIsBuilt)
