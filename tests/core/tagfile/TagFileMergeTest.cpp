@@ -51,6 +51,31 @@ TEST_F(TagFileMerge, WhatCannotBeMergedIsLeftAlone)
     EXPECT_EQ(log.lines(), std::vector<std::string>{"No images, cannot update tag file"});
 }
 
+/// What images show must not change by what they share with others, sequences above all: items inherit from items.
+TEST_F(TagFileMerge, SequencesThatAreEqualInPartStayWhatTheyWere)
+{
+    const DcmTagKey key = DCM_OriginalAttributesSequence;
+    const DatasetBuilder deep = anItem().with(DCM_CodeValue, "d").with(DCM_CodeMeaning, "same");
+    const DatasetBuilder nested =
+        anItem().with(DCM_CodeMeaning, "same").withItem(DCM_ReferencedSOPSequence, deep);
+    const DatasetBuilder images[] = {
+        anImage("1").withItem(key, nested),
+        anImage("2").withItem(key, nested).withItem(key, deep),
+        anImage("3").withItem(key, anItem().withItem(DCM_ReferencedSOPSequence, anItem())),
+        anImage("4").inSeries("1.2.4").withItem(key, deep),
+        anImage("5"),
+        anImage("1").withItem(key, nested)};
+    std::map<QByteArray, std::string> expected;
+    for (const DatasetBuilder& image : images) {
+        TagFile file;
+        const TagMap* added = add(file, image);
+        expected[added->uid(TagMap::ImageLevel)] = shownAlone(image);
+        ASSERT_TRUE(file.mergeIntoCacheFile());
+        for (const auto& [uid, shown] : expected)
+            ASSERT_EQ(shownText(*file.findImage(uid)), shown) << uid.constData();
+    }
+}
+
 /// Labels and marks of a study and its series are theirs alone, whichever of the two series is the larger one.
 TEST_F(TagFileMerge, ImagesHoldNothingThatTheirSeriesSaysOfItself)
 {
