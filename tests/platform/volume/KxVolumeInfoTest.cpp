@@ -1,12 +1,8 @@
 #include "PixelDataset.h"
-#include "platform/volumefile/OrlanMesh.h"
-#include "platform/volumefile/OrlanMeshWriter.h"
+#include "platform/volumefile/VolumeFileBuilder.h"
+#include "support/FileContent.h"
 
-#include <QFile>
 #include <QProcess>
-#include <QTemporaryDir>
-
-#include <gtest/gtest.h>
 
 #include <limits>
 
@@ -110,12 +106,6 @@ TEST(KxVolumeInfo, TakesTheRangeFromWhereTheImageTellsIt)
     }
 }
 
-TEST(KxVolumeInfo, AppliesTablesToPixels)
-{
-    const auto modality = ramp().withItem(DCM_ModalityLUTSequence, lookUp({3, 99, 16}, {7, 500, 900}));
-    EXPECT_EQ(numbersOf(*show(modality)), (QVector<double>{7, 500, 900, 900}));
-}
-
 TEST(KxVolumeInfo, SpreadsARangeOfFewSteps)
 {
     const auto info = show(PixelDataset(1, 4, 1).bytes({0x0a, 0}));  // 0 1 0 1
@@ -217,12 +207,11 @@ TEST(KxVolumeInfo, OfAVideoShowsAFrameAtThreeTenths)
     ASSERT_EQ(QProcess::execute(QStringLiteral("ffmpeg"), QString::fromLatin1(fade).split(QLatin1Char(' '))
                                                               << path),
               0);
-    QFile video(path);
-    ASSERT_TRUE(video.open(QIODevice::ReadOnly));
-    const QByteArray head = video.read(1000);  // the fragments of a video are cut anywhere
+    const QByteArray video = fileContent(path);
     auto* pixels = new DcmPixelData(DCM_PixelData);
+    // The fragments of a video are cut anywhere.
     pixels->putOriginalRepresentation(EXS_MPEG4HighProfileLevel4_1, nullptr,
-                                      sequenceOf({"", head, video.readAll()}).release());
+                                      sequenceOf({"", video.left(1000), video.mid(1000)}).release());
     const auto image = PixelDataset(64, 64, 8).colour("YBR_PARTIAL_420").with(DCM_NumberOfFrames, "40");
     image.dataset().insert(pixels);
     const auto info = show(image, 32, 32);
@@ -232,43 +221,24 @@ TEST(KxVolumeInfo, OfAVideoShowsAFrameAtThreeTenths)
     EXPECT_NEAR(numbersOf(*info).at(2), 255 * 0.3, 12);  // blue
 }
 
-TEST(KxVolumeInfo, FramesFromElsewhereAreShownAsTheyAre)
-{
-    const TypedData2D frame{1, 1, 3, PrimitiveType::UInt8, QByteArray("\x01\x02\x03")};
-    const auto info = KxVolumeInfo::fromFrame(nullptr, frame);
-    EXPECT_EQ(numbersOf(*info), (QVector<double>{1, 2, 3}));
-    EXPECT_EQ(info->highestValue(), 255);
-    EXPECT_FALSE(
-        KxVolumeInfo::fromFrame(nullptr, TypedData2D{2, 1, 3, PrimitiveType::UInt8, QByteArray("abc")}));
-    EXPECT_FALSE(KxVolumeInfo::fromFrame(nullptr, TypedData2D()));
-}
-
 TEST(KxVolumeInfo, ShowsASliceOfAVolumeFileInItsWindow)
 {
-    const QTemporaryDir folder;
-    const QByteArray path = folder.filePath(QStringLiteral("volume.h5")).toLocal8Bit();
-    Result result;
-    const Lattice lattice{"Level0", {2, 1, 2}, PrimitiveType::UInt16, 1};
-    auto writer = OrlanMeshWriter::create(path, lattice, result);
-    ASSERT_TRUE(writer) << qPrintable(result.text());
-    writer->writeSlice(0, {2, 1, 1, PrimitiveType::UInt16, QByteArray(4, 0)});
-    writer->writeSlice(1, {2, 1, 1, PrimitiveType::UInt16, QByteArray("\x64\0\xe8\x03", 4)});  // 100, 1000
     ParamBundle parameters;
-    parameters.insert("BoundingBox", Parameter::ofReals({0, 2, 0, 4, 0, 1}));
+    parameters.insert("BoundingBox", Parameter::ofReals({0, 20, 0, 20, 0, 1}));
     parameters.insert("WindowCenter", Parameter::ofReals({500}));
     parameters.insert("WindowWidth", Parameter::ofReals({200}));
-    writer->writeParameters(parameters);
-    ASSERT_TRUE(writer->finish().good());
-
-    const auto mesh = OrlanMesh::read(path, result);
-    ASSERT_TRUE(mesh) << qPrintable(result.text());
-    const auto info = KxVolumeInfo::readVolumeInfo(*mesh, 8, 8, 1, result);
+    const VolumeFileBuilder file;
+    ASSERT_TRUE(file.write(aLattice(), parameters).good());
+    const auto mesh = file.open();
+    Result result;
+    const auto info = KxVolumeInfo::readVolumeInfo(*mesh, 0, 0, 2, result);
     ASSERT_TRUE(info) << qPrintable(result.text());
-    EXPECT_EQ(numbersOf(*info), (QVector<double>{100, 1000}));
+    EXPECT_EQ(numbersOf(*info), numbersOf(sliceOf(aLattice(), 2)));
     EXPECT_EQ(info->lowestValue(), 400);
     EXPECT_EQ(info->highestValue(), 600);
-    EXPECT_EQ(info->pixelAspectRatio(), 0.25F);
-    EXPECT_FALSE(KxVolumeInfo::readVolumeInfo(*mesh, 8, 8, 2, result));
+    EXPECT_EQ(info->pixelAspectRatio(), 0.5F);
+    EXPECT_FALSE(KxVolumeInfo::readVolumeInfo(*mesh, 0, 0, 3, result));
+    EXPECT_FALSE(KxVolumeInfo::fromFrame(nullptr, {2, 1, 3, PrimitiveType::UInt8, "abc"})) << "too few bytes";
 }
 
 }  // namespace
