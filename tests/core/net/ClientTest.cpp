@@ -2,6 +2,7 @@
 #include "kddlib/net/cloud/KxCurlUploadStream.h"
 #include "kddlib/net/http/CurlError.h"
 #include "kddlib/net/http/KxCurlDownloadStream.h"
+#include "kddlib/net/http/KxCurlHandleFactory.h"
 #include "support/HttpServer.h"
 #include "support/LogCapture.h"
 #include "support/Setting.h"
@@ -46,23 +47,16 @@ TEST(ClientNames, AreToldFromFilesByTheirFirstLettersAndLeadToTheWebService)
     EXPECT_EQ(KxCurlClient::url("GetStudy?x=1"), "https://pacs:8443/quil/Browser.svc/GetStudy?x=1");
 }
 
-TEST_F(Client, ReadsABodyOfAnyLengthAndKeepsTheConnection)
+TEST(HandleFactory, ForgetsTheOptionsOfAnEasyHandleAtOnce)
 {
-    NginxServer nginx(NginxServer::Scheme::Http, "location = /connection { return 200 $connection; }"
-                                                 "location /chunked/ { alias files/; ssi on; ssi_types *; }");
-    const QByteArray big(3'000'001, 'x');
-    nginx.addFile("big", big);
-    const QByteArray connection = client.readBytes(nginx.url("connection"), status);
-    EXPECT_EQ(client.readBytes(nginx.url("big"), status), big);
-    EXPECT_TRUE(status.ok());
-    EXPECT_EQ(status.bytesReceived, quint64(big.size()));
-    EXPECT_EQ(status.headers.at("content-length"), "3000001");
-    EXPECT_EQ(client.readBytes(nginx.url("chunked/big"), status), big);
-    EXPECT_EQ(status.headers.at("transfer-encoding"), "chunked");
-    EXPECT_EQ(client.readBytes(nginx.url("connection"), status), connection);
-    EXPECT_THAT(client.readBytes(nginx.url("absent"), status).toStdString(), HasSubstr("404 Not Found"));
-    EXPECT_EQ(status.code, 404);
-    EXPECT_FALSE(status.ok() || status.failed);
+    KxCurlHandleFactory factory(1);
+    CurlEasy handle = factory.takeEasy();
+    CURL* const name = handle.get();
+    curl_easy_setopt(name, CURLOPT_PRIVATE, name);
+    factory.giveBack(std::move(handle));
+    void* kept = name;
+    curl_easy_getinfo(name, CURLINFO_PRIVATE, &kept);
+    EXPECT_EQ(kept, nullptr);
 }
 
 TEST_F(Client, KeepsHeadersByNameAndTheCodeOfTheFinalAnswer)
@@ -102,16 +96,6 @@ TEST_F(Client, SendsNothingThatIsNotWhatItSeems)
     EXPECT_TRUE(server.requests().empty());
     client.readBytes(server.url("a/../b"), status);
     EXPECT_THAT(lastRequest(), StartsWith("GET /a/../b HTTP/1.1\r\n"));
-}
-
-TEST_F(Client, DeletesCloudObjects)
-{
-    const LogCapture log;
-    client.setSessionID("12");
-    EXPECT_TRUE(client.deleteObject("gs://b/x/y#1"));
-    EXPECT_THAT(lastRequest(), StartsWith("DELETE /b/x%2Fy%231 HTTP/1.1\r\nHost: 127.0.0.1:"));
-    cloud.set("http://127.0.0.1:1/");
-    EXPECT_THROW(client.deleteObject("gs://b/x"), CurlError);
 }
 
 struct ServerFault

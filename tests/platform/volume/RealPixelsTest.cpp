@@ -1,4 +1,4 @@
-#include "PixelDataset.h"
+#include "Pixels.h"
 #include "platform/volume/FragmentReader.h"
 #include "support/RealFiles.h"
 

@@ -119,32 +119,28 @@ protected:
     DcmFileFormat file;
 };
 
-class DeepFile : public DicomFileReader, public testing::WithParamInterface<Encoding>
+TEST_F(DicomFileReader, ReadsWhatDoesNotNestTooDeepAlsoFromACallersOwnStream)
 {
-};
-
-TEST_P(DeepFile, IsReadUnlessItNestsTooDeepAlsoFromACallersOwnStream)
-{
-    DatasetBytes twice(GetParam());
-    twice.nest(0x0008, 0x1140, kMaxItemDepth).nest(0x0040, 0x0275, kMaxItemDepth);
-    EXPECT_STREQ(read(twice.file()).text(), "Normal");
-    EXPECT_EQ(depthOf(*file.getDataset(), DCM_ReferencedImageSequence), kMaxItemDepth);
-    EXPECT_EQ(depthOf(*file.getDataset(), DCM_RequestAttributesSequence), kMaxItemDepth);
-    for (const int depth : {kMaxItemDepth, kMaxItemDepth + 1, 100000}) {
-        const QByteArray bytes = DatasetBytes(GetParam()).nest(0x0008, 0x1140, depth).file();
-        const bool isAllowed = depth == kMaxItemDepth;
-        const char* const verdict = isAllowed ? "Normal" : "Sequence items are nested too deep";
-        EXPECT_STREQ(read(bytes).text(), verdict);
-        DcmInputBufferStream stream;
-        stream.setBuffer(bytes.constData(), bytes.size());
-        stream.setEos();
-        EXPECT_STREQ(KxDcmFileLoader().read(stream).text(), verdict);
-        EXPECT_EQ(stream.eos(), isAllowed);
+    for (const Encoding& encoding : kEncodings) {
+        SCOPED_TRACE(encoding.name);
+        DatasetBytes twice(encoding);
+        twice.nest(0x0008, 0x1140, kMaxItemDepth).nest(0x0040, 0x0275, kMaxItemDepth);
+        EXPECT_STREQ(read(twice.file()).text(), "Normal");
+        EXPECT_EQ(depthOf(*file.getDataset(), DCM_ReferencedImageSequence), kMaxItemDepth);
+        EXPECT_EQ(depthOf(*file.getDataset(), DCM_RequestAttributesSequence), kMaxItemDepth);
+        for (const int depth : {kMaxItemDepth, kMaxItemDepth + 1, 100000}) {
+            const QByteArray bytes = DatasetBytes(encoding).nest(0x0008, 0x1140, depth).file();
+            const bool isAllowed = depth == kMaxItemDepth;
+            const char* const verdict = isAllowed ? "Normal" : "Sequence items are nested too deep";
+            EXPECT_STREQ(read(bytes).text(), verdict);
+            DcmInputBufferStream stream;
+            stream.setBuffer(bytes.constData(), bytes.size());
+            stream.setEos();
+            EXPECT_STREQ(KxDcmFileLoader().read(stream).text(), verdict);
+            EXPECT_EQ(stream.eos(), isAllowed);
+        }
     }
 }
-
-INSTANTIATE_TEST_SUITE_P(Encodings, DeepFile, testing::ValuesIn(kEncodings),
-                         [](const auto& encoding) { return encoding.param.name; });
 
 TEST_F(DicomFileReader, DoesNotCountItemsBesideEachOther)
 {

@@ -6,7 +6,6 @@
 #include "support/FileContent.h"
 #include "support/HttpServer.h"
 #include "support/LogCapture.h"
-#include "support/RealFiles.h"
 
 #include <QDateTime>
 #include <QFile>
@@ -182,24 +181,6 @@ TEST(StoragePaths, BecomeUrls)
     EXPECT_EQ(usual, "http://filer:8181/a");
     EXPECT_EQ(KxDcmFileLoader::convertPathToExternalURL("//filer/a#b c"), KxCurlClient::url("a%23b%20c"));
     EXPECT_EQ(KxDcmFileLoader::convertPathToExternalURL("/data/a"), "");
-}
-
-TEST(RealFilesByUrl, AreReadAsFromTheirPaths)
-{
-    if (realFilesFolder().isEmpty())
-        GTEST_SKIP() << "KDD_TEST_DATA is not set";
-    QByteArray content;
-    const ScriptedServer server(
-        [&](const QByteArray&) -> ScriptedServer::Reply { return {httpResponse(content)}; });
-    for (const char* subfolder : {"transfer-syntaxes", "modalities", "odd"}) {
-        for (const QString& path : realFiles(subfolder)) {
-            content = fileContent(path);
-            if (content.size() > 20'000'000)
-                continue;
-            EXPECT_EQ(load(server.url("x"), Mode::Default), load(path.toStdString(), Mode::Default))
-                << path.toStdString();
-        }
-    }
 }
 
 }  // namespace
