@@ -4,6 +4,8 @@
 #include <QByteArray>
 #include <QDir>
 #include <QFile>
+#include <QJsonDocument>
+#include <QJsonObject>
 #include <QMap>
 #include <QString>
 
@@ -18,6 +20,7 @@
 #include <kddlib/KxCompressedDataMedia.h>
 #include <kddlib/Kxg.h>
 #include <kddlib/Loader.h>
+#include <kddlib/QAAudit.h>
 #include <kddlib/QAData.h>
 #include <kddlib/StudyRecord.h>
 #include <kddlib/TagFile.h>
@@ -57,48 +60,68 @@ void expectGood(const Kdd::Result& result, const std::string& what)
 }
 
 /// A folder of DICOM files, a folder of tag files and a database, below a folder that is there.
-struct Archive
+class Archive
 {
+public:
     explicit Archive(const QByteArray& folder)
-        : files(folder + '/' + kStudy)
-        , database("sqlite:" + folder + "/database")
+        : mFiles(folder + '/' + kStudy)
+        , mDatabase("sqlite:" + folder + "/database")
     {
-        QDir().mkpath(QFile::decodeName(files));
+        QDir().mkpath(QFile::decodeName(mFiles));
         Kdd::TagFile::setMetaFolder((folder + "/meta/").constData());
-        Kxg::SetDatabaseServer(database);
+        Kxg::SetDatabaseServer(mDatabase);
     }
 
     /// Named as servers name files, so that the loader finds the study by the path.
-    QByteArray path(int number) const { return files + '/' + imageUID(number) + "_0.dcm"; }
+    QByteArray path(int number) const { return mFiles + '/' + imageUID(number) + "_0.dcm"; }
 
-    const QByteArray files;
-    const QByteArray database;
+    void makeImage(int number) const
+    {
+        DcmFileFormat file;
+        DcmDataset& image = *file.getDataset();
+        image.putAndInsertString(DCM_SOPClassUID, UID_SecondaryCaptureImageStorage);
+        image.putAndInsertString(DCM_SOPInstanceUID, imageUID(number).constData());
+        image.putAndInsertString(DCM_StudyInstanceUID, kStudy.constData());
+        image.putAndInsertString(DCM_SeriesInstanceUID, kSeries.constData());
+        image.putAndInsertString(DCM_PatientName, "Doe^Jane");
+        image.putAndInsertString(DCM_Modality, "OT");
+        image.putAndInsertString(DCM_InstanceNumber, QByteArray::number(number).constData());
+        expect(file.saveFile(path(number).constData(), EXS_LittleEndianExplicit).good(),
+               "image " + std::to_string(number) + " is made");
+    }
+
+    std::unique_ptr<Kxg::Catalogue> open() const
+    {
+        Kdd::Result result;
+        std::unique_ptr<Kxg::Catalogue> catalogue = Kxg::Catalogue::open(mDatabase, result);
+        expectGood(result, "the database is open");
+        return catalogue;
+    }
+
+private:
+    QByteArray mFiles;
+    QByteArray mDatabase;
 };
 
-void makeImage(const Archive& archive, int number)
+void add(const Archive& archive, int number, Kdd::TagFile& file)
 {
-    DcmFileFormat file;
-    DcmDataset& image = *file.getDataset();
-    image.putAndInsertString(DCM_SOPClassUID, UID_SecondaryCaptureImageStorage);
-    image.putAndInsertString(DCM_SOPInstanceUID, imageUID(number).constData());
-    image.putAndInsertString(DCM_StudyInstanceUID, kStudy.constData());
-    image.putAndInsertString(DCM_SeriesInstanceUID, kSeries.constData());
-    image.putAndInsertString(DCM_PatientName, "Doe^Jane");
-    expect(file.saveFile(archive.path(number).constData(), EXS_LittleEndianExplicit).good(),
-           "an image is made");
+    const QByteArray path = archive.path(number);
+    expect(file.addDicomFile(path.constData(), path.constData(), false) != nullptr,
+           "image " + std::to_string(number) + " is added");
 }
 
-/// The first image makes the study, the others arrive later.
+/// The first two images make the study, the third arrives later.
 void writeAndMerge(const Archive& archive)
 {
-    for (int number = 1; number <= 3; ++number) {
-        makeImage(archive, number);
-        const QByteArray path = archive.path(number);
-        Kdd::TagFile file;
-        expect(file.addDicomFile(path.constData(), path.constData(), false) != nullptr, "an image is added");
-        expect(number == 1 ? file.writeCacheFile() : file.mergeIntoCacheFile(), "the tag file is written");
-        expect(file.imagesByUID().size() == number, "all images are in the tag file");
-    }
+    Kdd::TagFile file;
+    add(archive, 1, file);
+    add(archive, 2, file);
+    expect(file.writeCacheFile() && QFile::exists(file.cacheFilePath()), "the tag file is written");
+
+    Kdd::TagFile arrivals;
+    add(archive, 3, arrivals);
+    expect(arrivals.mergeIntoCacheFile(), "the third image is merged");
+    expect(arrivals.imagesByUID().size() == 3, "all three are in the tag file");
 }
 
 void registerFiles(const Archive& archive, Kxg::Catalogue& catalogue)
@@ -117,9 +140,12 @@ void registerFiles(const Archive& archive, Kxg::Catalogue& catalogue)
 /// What the database does not list any more goes from the tag file.
 void synchronise(Kxg::Catalogue& catalogue)
 {
-    expectGood(catalogue.removeImage(kStudy, imageUID(2)), "the second image is removed");
     Kdd::TagFile file;
     expect(file.readAndSync(kStudy.constData(), "server"), "the study is synchronised");
+    expect(file.imagesByUID().size() == 3, "all that is registered stays");
+
+    expectGood(catalogue.removeImage(kStudy, imageUID(2)), "the second image is removed");
+    expect(file.readAndSync(kStudy.constData(), "server"), "the study is synchronised again");
     expect(file.imagesByUID().keys() == QList<QByteArray>({imageUID(1), imageUID(3)}),
            "the second image is gone from it");
     expect(file.writeCacheFile(), "it is written");
@@ -135,6 +161,14 @@ void correct()
     QString message;
     expect(Kdd::TagFile::applyQA(job, message), "an image is corrected" + message.toStdString());
     expect(job.outcome.changed == 1 && job.outcome.notFound.isEmpty(), "and only that");
+
+    Kdd::TagFile file;
+    expect(file.readWhenFreeForStudy(kStudy.constData(), false), "the corrected study is read");
+    Kdd::AuditLog log;
+    QVector<Kdd::AuditEntry> entries;
+    expect(log.read(*file.findImage(imageUID(1))) && log.decode(entries) && entries.size() == 1 &&
+               entries.first().changes.first().oldText == QStringLiteral("Doe^Jane"),
+           "the image's log tells the former name");
 }
 
 std::string nameIn(Kdd::Item* item)
@@ -143,25 +177,38 @@ std::string nameIn(Kdd::Item* item)
     return item != nullptr && item->findAndGetOFString(DCM_PatientName, name).good() ? name.c_str() : "";
 }
 
+std::string jsonNameOf(const Kdd::TagMap& image)
+{
+    std::ostringstream out;
+    Kdd::writeDicomJson(out, image, "bulk");
+    const QJsonDocument json = QJsonDocument::fromJson(QByteArray::fromStdString(out.str()));
+    return json[QStringLiteral("00100010")][QStringLiteral("Value")][0][QStringLiteral("Alphabetic")]
+        .toString()
+        .toStdString();
+}
+
 void serve(const Archive& archive)
 {
     Kdd::Loader loader;
     expect(nameIn(loader.loadMetaData(archive.path(1).constData()).get()) == "Roe^Jane",
            "the corrected image is served from the tag file");
+    expect(nameIn(loader.loadMetaData(archive.path(3).constData()).get()) == "Doe^Jane",
+           "another one as it is");
     expect(nameIn(Kdd::Loader::loadDcmDataset(archive.path(1).constData(), -1).get()) == "Doe^Jane",
            "the DICOM file stays as it was");
+
     Kdd::TagFile file;
-    std::ostringstream json;
-    expect(file.readWhenFreeForStudy(kStudy.constData(), false), "the study is read");
-    Kdd::writeDicomJson(json, *file.findImage(imageUID(1)), "bulk");
-    expect(json.str().find("Roe^Jane") != std::string::npos, "DICOM JSON says the same");
+    expect(file.readWhenFreeForStudy(kStudy.constData(), false) &&
+               jsonNameOf(*file.findImage(imageUID(1))) == "Roe^Jane",
+           "DICOM JSON says the same");
 }
 
 /// The video module lies where the library looks for it: what cannot be decoded is refused by the decoders and not before.
 void useVideoModule()
 {
-    struct Zeros : Kdd::MediaSource
+    class Zeros : public Kdd::MediaSource
     {
+    public:
         qint64 size() const override { return 4096; }
         qint64 read(qint64 offset, char* out, qint64 length) override
         {
@@ -197,10 +244,10 @@ int main(int argc, char* argv[])
     }
     try {
         const Archive archive(argv[1]);
+        for (int number = 1; number <= 3; ++number)
+            archive.makeImage(number);
         writeAndMerge(archive);
-        Kdd::Result result;
-        const std::unique_ptr<Kxg::Catalogue> catalogue = Kxg::Catalogue::open(archive.database, result);
-        expectGood(result, "the database is open");
+        const std::unique_ptr<Kxg::Catalogue> catalogue = archive.open();
         registerFiles(archive, *catalogue);
         synchronise(*catalogue);
         correct();
