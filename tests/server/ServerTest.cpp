@@ -83,6 +83,7 @@ TEST_F(ServerTest, TellsWhetherItIsReady)
     const Reply without = get(server->statusAddress(), "/readyz");
     EXPECT_EQ(without.status, 503);
     EXPECT_EQ(without.body, "The image database does not answer\n") << "no path, no address";
+    ASSERT_TRUE(QDir().mkpath(mStore.filePath("meta")));
     const QByteArray address = "sqlite:" + mStore.filePath("kdd.sqlite").toUtf8();
     Result result;
     ASSERT_NE(Kxg::Catalogue::open(address, result), nullptr) << result.text().toStdString();

@@ -43,8 +43,8 @@ TEST(AddressGuard, LetsOnlyThoseThroughWhoNameThisServer)
             << host;
     for (const char* host :
          {"", "evil.example", "localhost.evil.example", "127.0.0.1.evil.example", "evil.example:127",
-          "127.0.0.2", "localhost:evil", "localhost:80:80", "user@localhost", "localhost/", "[::1",
-          "[::1]evil", "[evil]", "pacs.", "localhost evil", "192.168.1.2.3"})
+          "127.0.0.2", "localhost:evil", "localhost:80:80", "user@localhost", "[::1", "[::1]evil", "[evil]",
+          "pacs.", "localhost evil", "192.168.1.2.3"})
         EXPECT_EQ(baseFor(rules, QByteArray("http://") + host), "421") << host;
 }
 

@@ -251,7 +251,7 @@ TEST_F(HttpBodies, OfClientsThatDoNotReadTakeLittleMemoryAndHoldUpNobody)
 TEST_F(HttpBodies, OfAClientThatTakesNothingAreBrokenOff)
 {
     Http::HttpSettings settings;
-    settings.patience = std::chrono::milliseconds(100);
+    settings.patience = std::chrono::milliseconds(1000);
     RunningServer server(
         [](const Http::Request&) {
             Http::Response response(200);
