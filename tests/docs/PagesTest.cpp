@@ -44,6 +44,25 @@ TEST(SettingsPage, NamesEveryVariableThatIsReadAndNoOtherWithItsPlaceInTheFileAn
               matches(source, "\\{\"([A-Z_]+)\", \"([a-z]+)/([a-z]+)\",\\s+\"([^\"]+)\"\\}"));
 }
 
+TEST(SettingsPage, NamesWhatTheServicesSettingsBeginWith)
+{
+    const std::set<std::string> known =
+        matches(pageText(kSettingsPage), "\\| `\\[([a-z]+)\\]` `([a-z]+)` \\|");
+    QString section;
+    int count = 0;
+    for (const QString& line :
+         pageText(QStringLiteral("packaging/systemd/kdd.ini")).split(QLatin1Char('\n'))) {
+        if (line.startsWith(QLatin1Char('[')))
+            section = line.mid(1, line.size() - 2);
+        const std::set<std::string> key = matches(line, "^(?:; )?([a-z]+)=");
+        if (key.empty())
+            continue;
+        EXPECT_EQ(known.count(section.toStdString() + ' ' + *key.begin()), 1U) << line.toStdString();
+        ++count;
+    }
+    EXPECT_GT(count, 4);
+}
+
 TEST(ThreadsPage, TellsOfEveryClassThatIsExportedAndSoDoesItsHeader)
 {
     std::set<std::string> exported;

@@ -30,6 +30,8 @@ SampleArchive::SampleArchive()
                                                     mEnvironment.value(QStringLiteral("PATH")));
     mEnvironment.insert(QStringLiteral("KDD_CLOUD_DOWNLOAD"), QString::fromStdString(mServer.url("")));
     mServer.addFile("a.dcm", "of the server");
+    QDir(mFolder.path()).mkdir(QStringLiteral("viewer"));
+    putBeside("viewer/index.html", "<html>");
     putBeside("job.xml", kJob);
     putBeside("images.txt", kImage);
     putBeside("scan.dcm", "of this machine");
@@ -65,6 +67,10 @@ QString SampleArchive::substituted(QString text) const
     };
     for (const auto& [there, here] : kStandIns)
         text.replace(QLatin1String(there), here);
+    // A server is asked to end as soon as it has begun. Its port may be taken here.
+    text.replace(QRegularExpression(QStringLiteral("^(kdd serve[^#]*)(#.*)?$")),
+                 QStringLiteral("rm -f served; mkfifo served; KDD_SERVER_LISTEN=127.0.0.1:0 \\1 >served &\n"
+                                "read -r line <served; kill $!; wait $!"));
     // The door builds and tests everything, this test included: here it only has to know the word.
     text.replace(QRegularExpression(QStringLiteral("^\\./dev (\\w+)")),
                  QStringLiteral(KDD_SOURCES "/dev | grep '^  \\1 '"));
