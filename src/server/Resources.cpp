@@ -1,5 +1,6 @@
 #include "server/Resources.h"
 
+#include "server/dicomweb/metadata/MetadataResource.h"
 #include "server/dicomweb/render/RenderedResource.h"
 #include "server/dicomweb/render/ThumbnailResource.h"
 #include "server/dicomweb/retrieve/BulkDataResource.h"
@@ -8,8 +9,23 @@
 #include "server/dicomweb/search/ChangeFeed.h"
 #include "server/dicomweb/search/SearchResource.h"
 
+#include <QFile>
+
+#include <kddlib/ExResource.h>
+#include <kddlib/TagFile.h>
+
 namespace Kdd
 {
+namespace
+{
+
+QString answersFolder()
+{
+    const QByteArray folder = ExResource::answersFolder();
+    return folder.isEmpty() ? QFile::decodeName(TagFile::metaFolder()) + QStringLiteral("/answers") : QFile::decodeName(folder);
+}
+
+}  // namespace
 
 std::vector<std::unique_ptr<DicomWeb::Resource>> makeResources(ServedArchive& archive)
 {
@@ -18,6 +34,8 @@ std::vector<std::unique_ptr<DicomWeb::Resource>> makeResources(ServedArchive& ar
     std::vector<std::unique_ptr<Resource>> resources;
     // Viewers ask for frames nine times of ten.
     resources.push_back(std::make_unique<FramesResource>(archive.studies, archive.objects));
+    resources.push_back(std::make_unique<MetadataResource>(archive.studies, answersFolder(),
+                                                           qint64(ExResource::answersSize()) * 1024 * 1024));
     resources.push_back(std::make_unique<SearchResource>(archive.database, archive.studies));
     resources.push_back(std::make_unique<ChangeFeed>(archive.database));
     resources.push_back(std::make_unique<InstancesResource>(archive.studies, archive.objects));

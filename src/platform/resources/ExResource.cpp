@@ -35,6 +35,8 @@ constexpr Setting kCloudToken = {"KDD_CLOUD_TOKEN", "cloud/token", "https://oaut
 constexpr Setting kDatabase = {"KDD_DATABASE", "database/address", ""};
 constexpr Setting kMetaFolder = {"KDD_META_FOLDER", "folders/meta", ""};
 constexpr Setting kFileCacheFolder = {"KDD_FILE_CACHE", "folders/filecache", ""};
+constexpr Setting kAnswersFolder = {"KDD_ANSWERS", "folders/answers", ""};
+constexpr Setting kAnswersSize = {"KDD_ANSWERS_SIZE", "folders/answerssize", "1024"};
 constexpr Setting kTlsVerify = {"KDD_TLS_VERIFY", "tls/verify", "0"};
 constexpr Setting kTlsCaFile = {"KDD_TLS_CA_FILE", "tls/cafile", ""};
 constexpr Setting kSettleSeconds = {"KDD_SETTLE_SECONDS", "archive/settleseconds", "300"};
@@ -165,6 +167,16 @@ QByteArray ExResource::metaFolder()
 QByteArray ExResource::fileCacheFolder()
 {
     return valueOf(kFileCacheFolder);
+}
+
+QByteArray ExResource::answersFolder()
+{
+    return valueOf(kAnswersFolder);
+}
+
+int ExResource::answersSize()
+{
+    return numberOf(kAnswersSize, 0, 1024 * 1024);
 }
 
 bool ExResource::verifiesTls()
