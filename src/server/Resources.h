@@ -1,6 +1,8 @@
 #pragma once
 
 #include "server/dicomweb/Resource.h"
+#include "server/dicomweb/StudyShelf.h"
+#include "server/dicomweb/retrieve/ObjectShelf.h"
 
 #include <memory>
 #include <vector>
@@ -8,7 +10,15 @@
 namespace Kdd
 {
 
-/// All that answers below the prefix of DICOMweb, in the order in which they are asked whether a path is theirs.
-std::vector<std::unique_ptr<DicomWeb::Resource>> makeResources();
+/// What the server keeps of the archive between requests.
+struct ServedArchive
+{
+    DicomWeb::StudyShelf studies{64 * 1024 * 1024};
+    DicomWeb::ObjectShelf objects{16 * 1024 * 1024};
+};
+
+/// All that answers below the prefix of DICOMweb, in the order in which they are asked whether a path is theirs. The
+/// archive outlives them.
+std::vector<std::unique_ptr<DicomWeb::Resource>> makeResources(ServedArchive& archive);
 
 }  // namespace Kdd

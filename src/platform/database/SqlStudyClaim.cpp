@@ -1,3 +1,5 @@
+#include "platform/database/ChangeLog.h"
+#include "platform/database/SearchRows.h"
 #include "platform/database/SqlCatalogue.h"
 #include "platform/database/StudyContent.h"
 #include "platform/database/StudyDescription.h"
@@ -98,9 +100,18 @@ public:
         return conclude({request}, [&] { keep(built); });
     }
 
+    Kdd::Result noteSearch(const BuiltStudy& built) override
+    {
+        return conclude({}, [&] { keepSearch(built, TagFileStamp()); });
+    }
+
     Kdd::Result finishRemoved() override
     {
         return conclude(mStudy.requests, [this] {
+            if (searchRowOf(mConnection, mStudyId).isBuilt)
+                noteChange(mConnection, {ChangeKind::Deleted, mStudy.uid, {}, {}, 0});
+            removeSearchRows(mConnection, mStudyId);
+            putRegisteredRows(mConnection, mStudyId);
             // Also for a study that stays because it got files meanwhile: it has no tag file now.
             mConnection.change("UPDATE study SET tag_file_size = 0, tag_file_digest = NULL WHERE id = ?",
                                {mStudyId});
@@ -129,9 +140,45 @@ private:
 
     void keep(const BuiltStudy& built)
     {
+        TagFileStamp before;
+        {
+            SqlRows rows = mConnection.ask("SELECT tag_file_size, tag_file_digest FROM study WHERE id = ?",
+                                           {mStudyId});
+            if (rows.next())
+                before = {rows.number(0), rows.bytes(1)};
+        }
+        keepSearch(built, before);
         mConnection.change("UPDATE study SET tag_file_size = ?, tag_file_digest = ? WHERE id = ?",
                            {built.tagFile.size, bytesValue(built.tagFile.digest), mStudyId});
         describe(built.series);
+    }
+
+    /// `before` is the tag file that the study had so far.
+    void keepSearch(const BuiltStudy& built, const TagFileStamp& before)
+    {
+        const SearchRowState row = searchRowOf(mConnection, mStudyId);
+        int instances = 0;
+        for (const SeriesSearchRecord& series : built.search.series)
+            instances += series.instances;
+        // A tag file without images is that of a study that goes on waiting for its first one.
+        if (built.search.series.empty())
+            removeSearchRows(mConnection, mStudyId);
+        else
+            putSearchRows(mConnection, mStudyId, built.search, built.tagFile);
+        const bool isSame = row.isBuilt && built.movedTo.isEmpty() && before == built.tagFile;
+        if (isSame || (row.isBuilt && built.isOnlyRearranged))
+            return;
+        noteChange(mConnection, {kindOf(built, row, instances), mStudy.uid, built.movedFrom, built.movedTo,
+                                 instances});
+    }
+
+    static ChangeKind kindOf(const BuiltStudy& built, const SearchRowState& row, int instances)
+    {
+        if (!built.movedTo.isEmpty())
+            return ChangeKind::Moved;
+        if (!row.isBuilt || instances > row.instances)
+            return ChangeKind::Arrived;
+        return instances < row.instances ? ChangeKind::Deleted : ChangeKind::Corrected;
     }
 
     void describe(const std::vector<DicomFileRecord>& series)

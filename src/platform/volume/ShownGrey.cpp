@@ -99,26 +99,32 @@ ValueRange paddingOf(const ImageAttributes& attributes, PrimitiveType type)
     return paddingOf(attributes, DCM_PixelPaddingValue, DCM_PixelPaddingRangeLimit, type);
 }
 
-/// The values that go from black to white.
-ValueRange rangeOf(const FrameWindow& window)
+/// From 0, black, to 1, white.
+double shownBy(const FrameWindow& window, double value)
 {
-    // Between whole numbers: what is shown of a value is its distance from the lowest one plus half a step, which the
-    // exact function does not know.
-    const double shift = window.function == FrameWindow::Function::LinearExact ? 0.5 : 0;
-    return windowRange(window.center + shift, window.width);
+    // Of one step: a threshold.
+    constexpr double kLeastWidth = 1e-6;
+    switch (window.function) {
+    case FrameWindow::Function::Linear:
+        return (value - (window.center - 0.5)) / qMax(window.width - 1, kLeastWidth) + 0.5;
+    case FrameWindow::Function::LinearExact:
+        return (value - window.center) / window.width + 0.5;
+    case FrameWindow::Function::Sigmoid:
+        break;
+    }
+    return 1 / (1 + std::exp(-4 * (value - window.center) / window.width));
 }
 
-/// No values are black or white then, but all come ever closer to it.
-ShownPixels spreadBySigmoid(const TypedData2D& pixels, const FrameWindow& window)
+/// The picture as the window has it; the functions say what black and white are to a half of a step.
+ShownPixels spreadBy(const FrameWindow& window, const TypedData2D& pixels)
 {
     ShownPixels shown{pixels, {0, 1}};
     shown.pixels.type = PrimitiveType::Float32;
     allocatePixels(shown.pixels);
     visitPixelType(pixels.type, [&](auto zero) {
         const auto* values = valuesOf<decltype(zero)>(pixels);
-        std::transform(values, values + numValues(pixels), valuesOf<float>(shown.pixels), [&](auto value) {
-            return toFloat(1 / (1 + std::exp(-4 * (double(value) - window.center) / window.width)));
-        });
+        std::transform(values, values + numValues(pixels), valuesOf<float>(shown.pixels),
+                       [&](auto value) { return toFloat(shownBy(window, double(value))); });
     });
     return shown;
 }
@@ -140,8 +146,7 @@ ShownPixels showGrey(DcmItem& dataset, const FrameView& view, const StoredFrame&
     }
 
     shown.range = shown.range.scaled(rescale.slope, rescale.intercept);
-    const ValueRange window = view.window ? rangeOf(*view.window) : windowOf(attributes);
-    // Whoever asks for a window gets it, and sees that it shows nothing.
+    const ValueRange window = windowOf(attributes);
     const bool hasWindow = view.window || window.overlaps(shown.range);
     // It is looked up in after the rescale, so it is signed when those values reach below zero.
     const LookupTable voi =
@@ -150,15 +155,13 @@ ShownPixels showGrey(DcmItem& dataset, const FrameView& view, const StoredFrame&
         return reduce({voi.appliedTo(shown.pixels, rescale.slope, rescale.intercept), voi.range()},
                       view.width, view.height);
     // A window that shows none of the values was made for others, so it would show a black or a white image.
-    if (hasWindow)
+    if (hasWindow && !view.window)
         shown.range = window;
     // Averaging and rescaling may change places, as both are linear; this way only the small picture is rescaled.
     const ValueRange storedRange = shown.range.scaled(1 / rescale.slope, -rescale.intercept / rescale.slope);
     const ShownPixels reduced = reduce({shown.pixels, storedRange}, view.width, view.height);
     const TypedData2D values = scaleValues(reduced.pixels, rescale.slope, rescale.intercept);
-    if (view.window && view.window->function == FrameWindow::Function::Sigmoid)
-        return spreadBySigmoid(values, *view.window);
-    return {values, shown.range};
+    return view.window ? spreadBy(*view.window, values) : ShownPixels{values, shown.range};
 }
 
 }  // namespace Kdd

@@ -70,10 +70,10 @@ private:
     void sent(ResponseWriter::Step step);
     void sendOn();
     void finish();
-    void report(const QString& fault);
+    void report(bool isWhole);
     void closeSoftly();
     void drain();
-    void close(const QString& reason = {});
+    void close();
 
     SessionHost& mHost;
     std::shared_ptr<Connection> mConnection;

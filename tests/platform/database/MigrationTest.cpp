@@ -1,4 +1,5 @@
 #include "DatabaseFixture.h"
+#include "platform/database/StudySearch.h"
 
 using namespace Kxg;
 
@@ -82,13 +83,39 @@ TEST_P(MigrationTest, ADatabaseOfTheSecondSchemaKnowsWhichFilesACorrectionMoved)
 {
     add({dicom("/d/a", "1", "1.1", "x"), dicom("/d/b", "1", "1.1", "")});
     correct({{"1", "x", "2", "2.1", "y", "changes"}, {"1", "/d/b", "2", "2.1", "/d/b", "changes"}});
-    for (const char* backwards :
-         {"DROP INDEX file_of_correction", "ALTER TABLE file DROP COLUMN correction_id",
+    for (const char* backwards : {"DROP TABLE change", "DROP TABLE series_request", "DROP TABLE series_search",
+                                  "DROP TABLE study_modality", "DROP TABLE study_words", "DROP TABLE study_answer",
+                                  "DROP TABLE study_search", "DROP INDEX file_of_correction",
+                                  "ALTER TABLE file DROP COLUMN correction_id",
           "UPDATE schema_version SET version = 2"})
         execute(backwards);
     open();  // and bring it up to date
     correct({{"1", "x", "1", "1.1", "x", ""}, {"1", "/d/b", "1", "1.1", "/d/b", ""}});
     EXPECT_EQ(studies(), "1   1/2/0*\n");
+}
+
+/// Back to the schema before searches, with what it had.
+TEST_P(MigrationTest, ADatabaseOfTheThirdSchemaIsFoundBySearchesOnceItIsPrepared)
+{
+    DicomFileRecord file = dicom("/d/a", "1.2", "1.2.1", "x");
+    file.patientName = "Müller^Eva";
+    file.modality = "CT";
+    add({file});
+    for (const char* backwards : {"DROP TABLE change", "DROP TABLE series_request", "DROP TABLE series_search",
+                                  "DROP TABLE study_modality", "DROP TABLE study_words", "DROP TABLE study_answer",
+                                  "DROP TABLE study_search", "UPDATE schema_version SET version = 3"})
+        execute(backwards);
+    Kdd::Result result;
+    const auto search = StudySearch::open(address(), result);
+    ASSERT_EQ(result.text().toStdString(), "");
+    std::vector<FoundStudy> found;
+    ASSERT_TRUE(search->studies({}, found).good());
+    EXPECT_EQ(found.size(), 0u);
+    ASSERT_EQ(search->prepare().text().toStdString(), "");
+    ASSERT_TRUE(search->studies({}, found).good());
+    ASSERT_EQ(found.size(), 1u);
+    EXPECT_EQ(found[0].modalities, "CT");
+    EXPECT_TRUE(found[0].attributes.contains("Müller^Eva")) << found[0].attributes.toStdString();
 }
 
 }  // namespace

@@ -105,7 +105,7 @@ TEST_F(RenderTest, ShowsValuesByTheWindowThatIsAskedFor)
         {"32,32,linear-exact", 32, 127},
         {"32,32,linear-exact", 48, 255},
         {"32,32,linear-exact", 40, 191},
-        {"32,32", 40, 195},
+        {"32,32", 40, 197},
         {"32,16,sigmoid", 32, 127},
         {"32,16,sigmoid", 36, 186},
         {"32,16,sigmoid", 28, 68},

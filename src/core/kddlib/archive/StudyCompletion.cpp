@@ -117,6 +117,8 @@ CompletedStudy StudyCompletion::build(Kxg::StudyClaim& claim, const TagFile& loa
 {
     TagFile whole;
     const QByteArray& studyUID = claim.studyInstanceUID();
+    const bool isTrustedStamp =
+        isTagFile(TagFile::cacheFilePathForStudy(studyUID.constData()), mContents.tagFile);
     TagFileGenerator generator(nullptr, mOptimize);
     if (!generator.createTagFile(whole, claim.studyId(), studyUID.constData(), loaded))
         return failed("The tag file of study %1 is not built", studyUID,
@@ -125,6 +127,8 @@ CompletedStudy StudyCompletion::build(Kxg::StudyClaim& claim, const TagFile& loa
     Kxg::BuiltStudy built = builtStudy(whole);
     const int numUnread = generator.numKept() + generator.numMissing();
     built.isComplete = numUnread == 0;
+    // Nothing has changed but the order of what arrived.
+    built.isOnlyRearranged = mContents.changes.isEmpty() && isTrustedStamp;
     Result result = claim.finish(built);
     if (result.good() && numUnread > 0)
         return failed("Study %1 is built, but goes on waiting", studyUID,

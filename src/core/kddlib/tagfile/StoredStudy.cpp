@@ -5,6 +5,8 @@
 #include "kddlib/tagfile/format/StudyWriter.h"
 #include "platform/base/LogFile.h"
 #include "platform/base/Stopwatch.h"
+#include "platform/os/FileStatus.h"
+#include "platform/os/PathName.h"
 
 #include <QCryptographicHash>
 #include <QDataStream>
@@ -243,6 +245,11 @@ Result StoredStudy::writeInto(StudyFile& file, Tail tail)
     }
     // Of the bytes themselves, by which the database later tells whether others wrote since.
     mStamp = {content.size(), QCryptographicHash::hash(content, QCryptographicHash::Md5)};
+    FileStatus written;
+    if (statusOf(pathBytes(file.path()).constData(), written)) {
+        mStamp.fileSize = written.size;
+        mStamp.modified = written.modified;
+    }
     if (LogFile::debugLogging())
         LogFile::printf("Written tag file %s in %d msec", qUtf8Printable(file.path()), mFigures.writeMs);
     return result;

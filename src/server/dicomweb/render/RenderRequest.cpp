@@ -1,5 +1,6 @@
 #include "server/dicomweb/render/RenderRequest.h"
 
+#include <QList>
 #include <QVector>
 
 #include <cmath>

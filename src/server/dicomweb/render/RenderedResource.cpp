@@ -6,6 +6,8 @@
 #include "server/dicomweb/retrieve/ImageFinder.h"
 #include "server/http/MultipartWriter.h"
 
+#include <QList>
+
 #include <kddlib/TagMap.h>
 
 namespace Kdd::DicomWeb

@@ -4,6 +4,7 @@
 #include "server/dicomweb/retrieve/ImageFinder.h"
 
 #include <QFile>
+#include <QList>
 
 #include <dcmtk/dcmdata/dctk.h>
 #include <kddlib/KxDcmFileLoader.h>
@@ -39,6 +40,18 @@ bool hasPixels(DcmDataset& dataset)
            dataset.tagExists(DCM_DoubleFloatPixelData);
 }
 
+/// Has the dataset show what the tag file shows. Corrections concern attributes outside of sequences; what stands in
+/// sequences, tables of grey values among it, stays with its long values, which the tag file leaves out.
+void correct(DcmDataset& dataset, const TagMap& shown)
+{
+    DcmDataset attributes;
+    shown.insertInto(attributes);
+    while (DcmElement* element = attributes.remove(0UL)) {
+        if (element->ident() == EVR_SQ || dataset.insert(element, OFTrue).bad())
+            delete element;
+    }
+}
+
 }  // namespace
 
 ShownImage::ShownImage() = default;
@@ -68,8 +81,7 @@ Verdict ShownImage::open(const ServedStudy& study, const QByteArray& key)
         LogFile::errorf("%s holds another image than %s by now", origin.path.constData(), key.constData());
         return {410, QStringLiteral("The instance's DICOM file holds another one by now")};
     }
-    // A correction may concern how the pixels are to be shown: window, rescale, palette.
-    shown->insertInto(dataset());
+    correct(dataset(), *shown);
     return {};
 }
 

@@ -87,6 +87,10 @@ Result QARecord::claim(const QAData& job)
     if (known.isEmpty())
         return {};
     mCatalogue = std::move(catalogue);
+    if (!job.oldStudyUID.isEmpty()) {
+        mMovedFrom = job.oldStudyUID;
+        mMovedTo = job.studyUID;
+    }
     for (const QByteArray& uid : qAsConst(uids)) {
         const bool isDestination = uid == job.studyUID;
         if (!isDestination && !known.contains(uid))
@@ -303,13 +307,18 @@ void QARecord::finish(const StudyTree& tree, const Kxg::TagFileStamp& stamp, con
 {
     const auto found = mStudies.find(studyUID);
     const qint64 request = mRequests.value(studyUID, 0);
-    // A tag file that was not the one that the database knows may lack more than this correction.
-    if (found == mStudies.end() || request == 0 || !found->second.isRecognised)
+    if (found == mStudies.end() || request == 0)
         return;
     Study& study = found->second;
     Result result;
-    if (!tree.isEmpty()) {
-        result = study.claim->finishChange(builtStudy(tree.series(), stamp), request);
+    Kxg::BuiltStudy shown = builtStudy(tree.series(), stamp);
+    shown.movedFrom = mMovedFrom;
+    shown.movedTo = mMovedTo;
+    // A tag file that was not the one that the database knows may lack more than this correction.
+    if (!study.isRecognised) {
+        result = study.claim->noteSearch(shown);
+    } else if (!tree.isEmpty()) {
+        result = study.claim->finishChange(shown, request);
     } else {
         Kxg::StudyContents left;
         result = mCatalogue->studyContents(studyUID, left);
@@ -320,7 +329,7 @@ void QARecord::finish(const StudyTree& tree, const Kxg::TagFileStamp& stamp, con
         if (result.good() && isGone)
             result = study.claim->finishRemoved();
         else if (result.good() && left.images.empty())
-            result = study.claim->finishChange({}, request);
+            result = study.claim->finishChange(shown, request);
     }
     if (result.bad())
         LogFile::warnf("Study %s is built once more: %s", studyUID.constData(),
