@@ -176,7 +176,7 @@ QByteArray ExResource::answersFolder()
 
 int ExResource::answersSize()
 {
-    return numberOf(kAnswersSize, 1024 * 1024);
+    return numberOf(kAnswersSize, 0, 1024 * 1024);
 }
 
 bool ExResource::verifiesTls()

@@ -3,6 +3,7 @@
 #include "server/http/AcceptHeader.h"
 
 #include <QCryptographicHash>
+#include <QList>
 
 #include <dcmtk/dcmdata/dctag.h>
 #include <kddlib/BuildInfo.h>
