@@ -4,6 +4,7 @@ set(KDD_PUBLIC_HEADERS
   core/kddlib/Loader.h
   core/kddlib/TagFileGenerator.h
   core/kddlib/archive/ArchiveDatabase.h
+  core/kddlib/archive/CorrectedDataset.h
   core/kddlib/archive/DicomInput.h
   core/kddlib/archive/FileScan.h
   core/kddlib/archive/FileWalk.h
@@ -12,12 +13,15 @@ set(KDD_PUBLIC_HEADERS
   core/kddlib/archive/StudyChange.h
   core/kddlib/archive/StudyCheck.h
   core/kddlib/archive/StudyCompletion.h
+  core/kddlib/archive/StudyIndexing.h
   core/kddlib/archive/StudyIntake.h
   core/kddlib/archive/StudyStacker.h
   core/kddlib/archive/WorkObserver.h
   core/kddlib/capi/kddstream.h
   core/kddlib/capi/kddtagfile.h
   core/kddlib/items/DicomJson.h
+  core/kddlib/items/FrameIndex.h
+  core/kddlib/items/RegularFile.h
   core/kddlib/items/TextDecoding.h
   core/kddlib/items/TextEncoding.h
   core/kddlib/items/kdditem.h
@@ -47,6 +51,7 @@ set(KDD_PUBLIC_HEADERS
   core/kddlib/tagfile/qa/QAAudit.h
   core/kddlib/tagfile/qa/QAData.h
   core/kddlib/tagfile/qa/QASeriesMove.h
+  core/kddlib/tagmodel/AttributeDifference.h
   core/kddlib/tagmodel/OwnAttributes.h
   core/kddlib/tagmodel/TagElement.h
   core/kddlib/tagmodel/TagMap.h
@@ -77,7 +82,10 @@ set(KDD_PUBLIC_HEADERS
   platform/database/Catalogue.h
   platform/database/DirectoryEntry.h
   platform/database/Kxg.h
+  platform/database/SearchRecord.h
+  platform/database/SearchText.h
   platform/database/StorageManager.h
+  platform/database/StudySearch.h
   platform/database/TagFileStamp.h
   platform/filecache/ExFileCache.h
   platform/os/ExclusiveFile.h
@@ -85,6 +93,7 @@ set(KDD_PUBLIC_HEADERS
   platform/os/PathName.h
   platform/os/SystemResult.h
   platform/resources/ExResource.h
+  platform/volume/FrameView.h
   platform/volume/KxCompressedDataMedia.h
   platform/volume/KxHistogram.h
   platform/volume/KxVolumeInfo.h

@@ -12,6 +12,7 @@ namespace Kdd
 namespace
 {
 
+// Also in the table below, which knows texts only.
 constexpr int kColumns = 96;
 constexpr int kRows = 128;
 constexpr int kLineHeight = 6;  // [pixels]
@@ -66,6 +67,7 @@ QByteArray requestForm(SampleRandom& random)
 
 void writeCaptureStudy(const SampleStudy& study, SampleFolder& folder)
 {
+    // The old way of writing: implicit, with lengths of sequences and groups.
     const SampleSeries series = {study,
                                  1,
                                  "OT",

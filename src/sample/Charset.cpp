@@ -19,6 +19,7 @@ struct Alphabet
     int distance;
 };
 
+// What is in the set and at which distance, as its ISO 8859 part has it.
 const Alphabet kLatin = {0x00A0, 0x00FF, 0};
 const Alphabet kGreek = {0x0384, 0x03CE, 0x2D0};
 const Alphabet kCyrillic = {0x0401, 0x045F, 0x360};
@@ -35,8 +36,10 @@ const Kanji kKanji[] = {
     {u'中', "Cf"}, {u'村', "B<"}, {u'一', "0l"}, {u'鈴', "Nk"}, {u'木', "LZ"},
 };
 
+// The escapes of ISO 2022 that lead into the two-byte set and back.
 const char* const kToJapanese = "\033$B";
 const char* const kToAscii = "\033(B";
+// One row of the set holds the kana in the order of Unicode.
 constexpr ushort kFirstHiragana = 0x3041;
 constexpr ushort kLastHiragana = 0x3093;
 
@@ -52,6 +55,7 @@ QByteArray inAlphabet(SampleCharset charset, const Alphabet& alphabet, const QSt
     QByteArray bytes;
     for (const QChar character : text) {
         const ushort code = character.unicode();
+        // ASCII is the lower half of each of these sets.
         if (code < 0x80) {
             bytes.append(static_cast<char>(code));
         } else if (code >= alphabet.first && code <= alphabet.last) {
@@ -66,6 +70,7 @@ QByteArray inAlphabet(SampleCharset charset, const Alphabet& alphabet, const QSt
 QByteArray jisOf(QChar character)
 {
     const ushort code = character.unicode();
+    // "$" is the row of the hiragana.
     if (code >= kFirstHiragana && code <= kLastHiragana)
         return QByteArray("$").append(static_cast<char>('!' + code - kFirstHiragana));
     for (const Kanji& kanji : kKanji) {
@@ -85,8 +90,10 @@ QByteArray inJapanese(const QString& text)
         if (wantsJapanese != isJapanese)
             bytes.append(wantsJapanese ? kToJapanese : kToAscii);
         isJapanese = wantsJapanese;
+        // Of the two bytes neither is 80 or above, so only the escapes tell them from ASCII.
         bytes.append(wantsJapanese ? jisOf(character) : QByteArray(1, character.toLatin1()));
     }
+    // Text ends in ASCII, or what follows the value would be read as Japanese.
     return isJapanese ? bytes.append(kToAscii) : bytes;
 }
 
@@ -103,6 +110,7 @@ QByteArray specificCharacterSet(SampleCharset charset)
         return "ISO_IR 126";
     case SampleCharset::Cyrillic:
         return "ISO_IR 144";
+    // The empty first value is the set that texts begin in: ASCII.
     case SampleCharset::Japanese:
         return "\\ISO 2022 IR 87";
     case SampleCharset::Utf8:
@@ -116,6 +124,7 @@ QByteArray inCharset(SampleCharset charset, const char* utf8)
     const QString text = QString::fromUtf8(utf8);
     switch (charset) {
     case SampleCharset::Ascii:
+        // An alphabet without letters refuses everything beyond ASCII.
         return inAlphabet(charset, {}, text);
     case SampleCharset::Latin1:
         return inAlphabet(charset, kLatin, text);

@@ -14,6 +14,7 @@ namespace Kdd
 namespace
 {
 
+// The table of the scout below tells it as well, as its rescale intercept.
 constexpr int kOffset = 1024;         // of stored values, so that they need no sign
 constexpr double kSpacing = 6.25;     // [mm] 400 mm in 64 pixels
 constexpr double kTopOfStack = 64.5;  // [mm]
@@ -87,6 +88,8 @@ const SampleAttribute kScout[] = {
     {DCM_WindowWidth, "900"},
 };
 
+// Many representations, odd lengths, negative numbers and no value at all: it all has to come back from a tag
+// file byte by byte.
 const SamplePrivate kAcquisition[] = {
     {0x01, EVR_LO, "Adult/Chest/Routine"},
     {0x02, EVR_DS, "0.9"},
@@ -114,6 +117,7 @@ struct Reconstruction
     bool isSigned;     // whether the pixels are stored with a sign
 };
 
+// Two windows for one image, and both kinds of pixels, signed and unsigned, within one study.
 const Reconstruction kSoftTissue = {"SOFT 30", "40\\60", "400\\350", "WINDOW1\\WINDOW2", 1.5, 24, false};
 const Reconstruction kLung = {"LUNG 70", "-600", "1500", "LUNG", 3, 60, true};
 
@@ -125,22 +129,28 @@ void describeReconstruction(SampleDataset& dataset, const Reconstruction& recons
         .with(DCM_WindowCenter, reconstruction.center)
         .with(DCM_WindowWidth, reconstruction.width)
         .with(DCM_WindowCenterWidthExplanation, reconstruction.explanation)
+        // Signed pixels need no offset, since they hold the Hounsfield units themselves.
         .with(DCM_RescaleIntercept, reconstruction.isSigned ? 0 : -kOffset);
 }
 
 // What the scanner measures anew for every slice.
 void describeExposure(SampleObject& object, int instance, double depth)
 {
+    // Tubes give more current where the body is thicker.
     const int current = 170 + static_cast<int>(110 * swell(depth / 160)) + object.random().between(-4, 4);
+    // A new acquisition after every 120 slices, so that a value is shared by many images and not by all.
     object.dataset()
         .with(DCM_AcquisitionNumber, 2 + (instance - 1) / 120)
         .with(DCM_AcquisitionDate, kSampleDate)
         .with(DCM_XRayTubeCurrent, current)
         .with(DCM_Exposure, current / 2)
         .with(DCM_CTDIvol, decimal(current * 0.034, 4))
+        // The private block of the whole series goes on with what each slice has of its own.
         .with(SampleDataset::privateTag(0x0019, 0x10, EVR_UL), 4000000 + instance * 2304)
         .with(SampleDataset::privateTag(0x0019, 0x11, EVR_FD), decimal(kTopOfStack - depth + 0.0125, 4))
+        // Bytes of no known representation, of even and of odd lengths.
         .withBytes(SampleDataset::privateTag(0x0019, 0x12, EVR_UN), "T" + QByteArray::number(instance * 7919))
+        // A second creator in another group.
         .with(DcmTag(0x0021, 0x0010, EVR_LO), "SAMPLE CT RECON 2.0")
         .with(SampleDataset::privateTag(0x0021, 0x01, EVR_IS), instance)
         .with(SampleDataset::privateTag(0x0021, 0x02, EVR_UT), "pipeline=backprojection;pass=1");
@@ -149,6 +159,7 @@ void describeExposure(SampleObject& object, int instance, double depth)
 void describePlace(SampleDataset& dataset, const SampleStudy& study, double depth)
 {
     const double z = kTopOfStack - depth;
+    // The position is that of the first pixel's centre.
     const double corner = -kSpacing * 63 / 2;
     dataset.with(DCM_FrameOfReferenceUID, study.uid("frame of reference"))
         .with(DCM_ImagePositionPatient, decimals({corner, corner - 20.5, z}, 4))
@@ -162,6 +173,7 @@ void addPixels(SampleObject& object, const Reconstruction& reconstruction, doubl
     if (!reconstruction.isSigned)
         return picture.addUnsigned(object.dataset(), kOffset, 12);
     picture.addSigned(object.dataset());
+    // Whether the padding has a sign is for the pixels to say, so the representation is named.
     object.dataset().with(DcmTag(DCM_PixelPaddingValue, EVR_SS), -2000);
 }
 
@@ -177,8 +189,10 @@ void writeSlice(const SampleSeries& series, const SampleSeries& scout, const Rec
     dataset.withAll(kScanner).withAll(kSpiral).withPrivate(0x0019, "SAMPLE CT ACQ 1.0", kAcquisition);
     dataset.with(DCM_AcquisitionTime, series.study.time(series.delay + second));
     series.study.describeRequest(dataset);
+    // Only some slices were corrected, so that the sequence is not the same in all of them.
     if (instance % 7 == 0)
         series.study.describeCorrection(dataset);
+    // The same reference in every slice: something that is stored once for the whole series.
     scout.refer(dataset, DCM_ReferencedImageSequence, 1);
     describeReconstruction(dataset, reconstruction);
     describeExposure(object, instance, depth);
@@ -206,6 +220,7 @@ void writeCtStudy(const SampleStudy& study, SampleFolder& folder)
     const SampleSeries soft = {
         study, 2, "CT", UID_CTImageStorage, "Chest 1.5 soft", 95, SampleEncoding::ExplicitWithLengths};
     const SampleSeries lung = {study, 3, "CT", UID_CTImageStorage, "Chest 3.0 lung", 95};
+    // What is left is shared two to one, because lung slices are twice as thick.
     const int slices = study.images - 3;  // the scout and the two documents
     const int lungSlices = slices / 3;
 

@@ -14,6 +14,7 @@ constexpr double kAir = -1000;      // [HU]
 constexpr double kLung = -860;      // [HU]
 constexpr double kBreathing = 320;  // length of a chest [mm]; what is longer shows the next one
 
+// Painted one on top of the other: the last one covers those before.
 const SampleEllipse kTrunk[] = {
     {0, 0.86, 0.70, 0.05, -300},  // table top
     {0, 0, 0.90, 0.66, -95},      // fat
@@ -61,6 +62,7 @@ SamplePicture chestScout()
 {
     SamplePicture picture(kMatrix, kScoutRows, kAir);
     picture.paintAll(kFront);
+    // Ribs over the lungs, which would be plain dark spots without them.
     for (int rib = 0; rib < 7; ++rib) {
         const double y = -0.75 + 0.16 * rib;
         picture.paint({-0.36, y, 0.26, 0.025, -120}).paint({0.36, y, 0.26, 0.025, -120});

@@ -28,6 +28,7 @@ void check(const OFCondition& condition, const DcmTag& tag, const QByteArray& va
 {
     if (condition.good())
         return;
+    // Only the head of the value is told, for some are long.
     throw SampleFault(QStringLiteral("The attribute %1 cannot take the value \"%2\": %3")
                           .arg(QString::fromLatin1(tag.toString().c_str()),
                                QString::fromLatin1(value.left(64)), QString::fromLatin1(condition.text())));
@@ -44,6 +45,7 @@ std::unique_ptr<DcmElement> newElement(const DcmTag& tag, const QByteArray& valu
 void insert(DcmItem& into, std::unique_ptr<DcmElement> element)
 {
     const DcmTag tag = element->getTag();
+    // Replaces an earlier value, as the header promises.
     check(into.insert(element.get(), OFTrue), tag, "element");
     // The item owns the element once it has taken it.
     static_cast<void>(element.release());
@@ -97,12 +99,14 @@ SampleDataset& SampleDataset::withCode(const DcmTag& sequence, const SampleCode&
 
 DcmTag SampleDataset::privateTag(Uint16 group, Uint8 element, DcmEVR vr)
 {
+    // The block that the creator has reserved is the first, 10.
     return {group, static_cast<Uint16>(0x1000 + element), vr};
 }
 
 SampleDataset SampleDataset::item(const DcmTag& sequence)
 {
     DcmItem* item = nullptr;
+    // -2 asks for a new item at the end.
     check(mItem->findOrCreateSequenceItem(sequence, item, -2), sequence, "item");
     return SampleDataset(*item);
 }

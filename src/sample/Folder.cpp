@@ -21,6 +21,7 @@ using std::filesystem::path;
 
 path nativePath(const QString& name)
 {
+    // By its bytes, which the standard library hands to the system as they are.
     return QFile::encodeName(name).toStdString();
 }
 
@@ -67,6 +68,7 @@ public:
     }
     ~NewFile()
     {
+        // After the renaming there is nothing to remove.
         std::error_code ignored;
         std::filesystem::remove(mPart, ignored);
     }
@@ -98,6 +100,7 @@ void NewFile::write(DcmFileFormat& object, SampleEncoding encoding) const
     const auto size = std::filesystem::file_size(mPart, error);
     if (isCut || error || size != object.calcElementLength(syntaxOf(encoding), lengthsOf(encoding)))
         fail(QStringLiteral("not all of it could be stored; is the disk full?"));
+    // In one step, so that a reader sees the former file or the new one.
     std::filesystem::rename(mPart, mName, error);
     if (error)
         fail(QString::fromStdString(error.message()));
@@ -121,6 +124,7 @@ void SampleFolder::save(DcmFileFormat& object, const SamplePlace& place, SampleE
     count(place, object.calcElementLength(syntaxOf(encoding), lengthsOf(encoding)));
 }
 
+// Studies and series by their folders, since several files make one of each.
 void SampleFolder::count(const SamplePlace& place, qint64 bytes)
 {
     mStudies.insert(place.study);

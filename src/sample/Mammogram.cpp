@@ -19,6 +19,7 @@ constexpr int kColumns = 72;
 constexpr int kRows = 96;
 
 const SampleAttribute kMachine[] = {
+    // Each view puts its own side in the last value.
     {DCM_ImageType, "DERIVED\\PRIMARY\\\\RIGHT"},
     {DCM_Manufacturer, "Sample Imaging"},
     {DCM_ManufacturerModelName, "Sample MG"},
@@ -104,6 +105,7 @@ SamplePicture breast(double side, bool isOblique)
         .paint({-0.30 * side, down - 0.28, 0.30, 0.14, 2300})
         .paint({0.15 * side, down - 0.10, 0.07, 0.06, 3300})
         .paint({0.56 * side, down, 0.05, 0.06, 2200});
+    // The oblique view also shows the muscle of the chest.
     if (isOblique)
         picture.paint({-1.15 * side, -1.05, 0.75, 1.25, 2900});
     return picture;
@@ -122,6 +124,7 @@ void describeView(SampleDataset& dataset, const View& view)
         .withCode(DCM_AnatomicRegionSequence, kBreast)
         .withCode(DCM_ViewCodeSequence, view.code)
         .withPrivate(0x0019, "SAMPLE MG EXPOSURE", kExposure);
+    // An item without anything in it, which has to be kept as well.
     dataset.item(DCM_AcquisitionContextSequence);
 }
 
@@ -140,6 +143,7 @@ void describeExposure(SampleObject& object)
 void writeView(const SampleStudy& study, int number, SampleFolder& folder)
 {
     const View& view = kViews[number - 1];
+    // Outlives the series, which keeps the pointer alone.
     const QByteArray description = QByteArray(view.side) + view.position;
     const SampleSeries series = {study,
                                  number,

@@ -18,6 +18,7 @@ namespace
 constexpr double kSpacing = 3.4375;     // [mm] 220 mm in 64 pixels
 constexpr double kSliceDistance = 4.4;  // [mm]
 constexpr double kBase = -62;           // of the stack [mm]
+// More than the bound up to which tag files keep a value, so that it is left out there.
 constexpr int kProtocolBytes = 2000;
 
 const SampleAttribute kScanner[] = {
@@ -44,6 +45,7 @@ const SampleAttribute kScanner[] = {
     {DCM_AcquisitionMatrix, "0\\64\\64\\0"},
     {DCM_InPlanePhaseEncodingDirection, "ROW"},
     {DCM_PixelSpacing, "3.4375\\3.4375"},
+    // The dictionary leaves open whether it is signed.
     {DCM_SmallestPixelValueInSeries, "0", EVR_US},
     {DCM_PatientOrientation, ""},
     {DCM_BurnedInAnnotation, "NO"},
@@ -96,6 +98,7 @@ const SampleAttribute kTurboSpinEcho[] = {
     {DCM_SpecificAbsorptionRateDefinition, "IEC_HEAD"},
 };
 
+// Numbers at the limits of their representations.
 const SamplePrivate kHeader[] = {
     {0x08, EVR_CS, "IMAGE NUMBER 4"},
     {0x09, EVR_LO, "1.0"},
@@ -115,6 +118,7 @@ struct Localizer
 {
     SamplePlane plane;
     const char* orientation;
+    // Of the centre of the first pixel.
     QVector<double> corner;  // [mm]
 };
 
@@ -140,10 +144,12 @@ void addPrivateBlocks(SampleObject& object, int instance)
     dataset.withPrivate(0x0029, "SAMPLE MR HEADER", kHeader)
         .withBytes(SampleDataset::privateTag(0x0029, 0x20, EVR_OB), protocolDump())
         .with(DcmTag(0x0051, 0x0010, EVR_LO), "SAMPLE MR MEASURE")
+        // Bytes that are no text, some that could be taken for one, and none at all.
         .withBytes(SampleDataset::privateTag(0x0051, 0x01, EVR_UN), QByteArray("\x01\x00\x7f\xff", 4))
         .withBytes(SampleDataset::privateTag(0x0051, 0x02, EVR_UN),
                    "t=" + QByteArray::number(object.random().between(1000, 99999)))
         .withBytes(SampleDataset::privateTag(0x0051, 0x03, EVR_UN), QByteArray());
+    // A private sequence, whose items need the creator of their block again.
     dataset.item(SampleDataset::privateTag(0x0051, 0x04, EVR_SQ))
         .with(DcmTag(0x0051, 0x0010, EVR_LO), "SAMPLE MR MEASURE")
         .with(SampleDataset::privateTag(0x0051, 0x05, EVR_IS), instance % 5)
@@ -164,6 +170,7 @@ void describeImage(SampleObject& object, const SampleStudy& study, int instance)
 
 void addPixels(SampleObject& object, SamplePicture picture)
 {
+    // Windows are chosen by the scanner for every image, so they differ.
     const int center = 420 + object.random().between(-30, 30);
     object.dataset()
         .with(DCM_WindowCenter, center)
@@ -190,6 +197,7 @@ void writeLocalizer(const SampleSeries& series, int instance, SampleFolder& fold
 void describePlace(SampleDataset& dataset, int instance)
 {
     const double z = kBase + (instance - 1) * kSliceDistance;
+    // From the first to the last pixel there are 63 distances, half of them on either side of the middle.
     const double corner = -kSpacing * 63 / 2;
     dataset.with(DCM_ImagePositionPatient, decimals({corner, corner, z}, 4))
         .with(DCM_SliceLocation, decimal(z, 4));

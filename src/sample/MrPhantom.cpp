@@ -53,6 +53,7 @@ SamplePicture headSection(double height)
     // Above the top the next head begins: the stack may be longer than a head.
     const double part = height / kHeadHeight - std::floor(height / kHeadHeight);
     const double fromMiddle = 2 * part - 1;
+    // A little more than a ball has, so that the ends of the head still are a spot.
     const double scale = std::sqrt(1.05 - fromMiddle * fromMiddle);
     SamplePicture picture(kMatrix, kMatrix, 15);
     for (const SampleEllipse& whole : kAxial) {

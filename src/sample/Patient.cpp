@@ -15,6 +15,7 @@ namespace Kdd
 namespace
 {
 
+// That of the day of the studies.
 constexpr int kThisYear = 2024;
 
 struct Person
@@ -50,6 +51,7 @@ const Records kRecords[] = {
      "ул. Садовая 15, Ясногорск",
      "Боится закрытых помещений",
      "Жуков^Андрей^Львович"},
+    // Letters, ideographs and their sound, the three groups of a Japanese name.
     {{{"Yamada^Tarou=山田^太郎=やまだ^たろう", "M"},
       {"Nakamura^Hanako=中村^花子=なかむら^はなこ", "F"},
       {"Suzuki^Ichirou=鈴木^一郎=すずき^いちろう", "M"}},
@@ -65,6 +67,7 @@ const Records kRecords[] = {
 void addRecords(SamplePatient& patient, int set)
 {
     const Records& records = kRecords[static_cast<int>(patient.charset)];
+    // Another set of studies has another person with the same address.
     const Person& person = records.persons[(set - 1) % static_cast<int>(std::size(records.persons))];
     patient.name = inCharset(patient.charset, person.name);
     patient.sex = person.sex;
@@ -86,6 +89,7 @@ SamplePatient samplePatient(unsigned seed, int set, SampleCharset charset)
     patient.charset = charset;
     addRecords(patient, set);
 
+    // Numbered through all sets, so that no two patients share an identifier.
     const int number = (set - 1) * static_cast<int>(std::size(kRecords)) + static_cast<int>(charset) + 1;
     SampleRandom random("patient " + QByteArray::number(number) + " of " + QByteArray::number(seed));
     const int age = random.between(21, 88);
@@ -102,6 +106,7 @@ SamplePatient samplePatient(unsigned seed, int set, SampleCharset charset)
 
 void SamplePatient::describe(SampleDataset& dataset) const
 {
+    // ASCII is what a dataset has that does not say.
     if (charset != SampleCharset::Ascii)
         dataset.with(DCM_SpecificCharacterSet, specificCharacterSet(charset));
     dataset.with(DCM_PatientName, name)
@@ -114,6 +119,7 @@ void SamplePatient::describe(SampleDataset& dataset) const
         .with(DCM_PatientWeight, weight)
         .with(DCM_PatientAddress, address)
         .with(DCM_PatientComments, comments)
+        // Empty values, which have to stay empty and not to vanish.
         .with(DCM_EthnicGroup, "")
         .with(DCM_AdditionalPatientHistory, "")
         .with(DCM_PatientState, "")

@@ -26,10 +26,12 @@ double length(double x, double y)
 // it matters.
 double depthWithin(const SampleEllipse& ellipse, double x, double y)
 {
+    // In the ellipse's own measure the edge has the distance 1 from the centre.
     const double partX = x / ellipse.radiusX;
     const double partY = y / ellipse.radiusY;
     const double part = length(partX, partY);
     const double slope = length(partX / ellipse.radiusX, partY / ellipse.radiusY);
+    // In the centre itself no direction leads to the edge.
     return slope > 0 ? (1 - part) * part / slope : std::min(ellipse.radiusX, ellipse.radiusY);
 }
 
@@ -44,6 +46,7 @@ SamplePicture::SamplePicture(int columns, int rows, double background)
 
 SamplePicture& SamplePicture::paint(const SampleEllipse& ellipse)
 {
+    // The shorter side counts, so that a circle is round in every picture.
     const double pixelsPerUnit = std::min(mColumns, mRows) / 2.0;
     double* pixel = mPixels.data();
     for (int row = 0; row < mRows; ++row) {
@@ -81,6 +84,7 @@ void SamplePicture::addUnsigned(SampleDataset& dataset, int offset, int bitsStor
     const QVector<Uint16> pixels = words(offset, 0, (1 << bitsStored) - 1);
     const auto range = std::minmax_element(pixels.begin(), pixels.end());
     add(dataset, pixels, bitsStored);
+    // The last two name their representation, since the dictionary leaves it to the pixels.
     dataset.with(DCM_PixelRepresentation, 0)
         .with(DcmTag(DCM_SmallestImagePixelValue, EVR_US), *range.first)
         .with(DcmTag(DCM_LargestImagePixelValue, EVR_US), *range.second);
@@ -88,6 +92,7 @@ void SamplePicture::addUnsigned(SampleDataset& dataset, int offset, int bitsStor
 
 void SamplePicture::addSigned(SampleDataset& dataset) const
 {
+    // All that sixteen bits hold: nothing that is painted comes near.
     add(dataset, words(0, -32768, 32767), 16);
     const auto range = std::minmax_element(mPixels.begin(), mPixels.end());
     dataset.with(DCM_PixelRepresentation, 1)

@@ -44,6 +44,7 @@ const SampleAttribute kText[] = {
     {DCM_BoundingBoxTextHorizontalJustification, "LEFT"},
 };
 
+// A closed line: its last point is its first. Reals that floats hold exactly.
 const SampleAttribute kPolyline[] = {
     {DCM_GraphicAnnotationUnits, "PIXEL"}, {DCM_GraphicDimensions, "2"},
     {DCM_NumberOfGraphicPoints, "4"},      {DCM_GraphicData, "36\\24\\44.5\\22.25\\43.75\\31\\36\\24"},
@@ -66,6 +67,7 @@ void annotate(SampleDataset& dataset, const SampleSeries& series, int instance, 
 {
     SampleDataset annotation = dataset.item(DCM_GraphicAnnotationSequence);
     series.refer(annotation, DCM_ReferencedImageSequence, instance);
+    // By the name of the layer above.
     annotation.with(DCM_GraphicLayer, "MARKS");
     annotation.item(DCM_TextObjectSequence).withAll(kText).with(DCM_UnformattedTextValue, text);
     annotation.item(DCM_GraphicObjectSequence).withAll(kPolyline);

@@ -15,6 +15,7 @@ namespace
 
 constexpr int kColumns = 80;
 constexpr int kRows = 96;
+// One for each value of twelve bits.
 constexpr int kLutEntries = 4096;
 
 const SampleAttribute kMachine[] = {
@@ -26,6 +27,7 @@ const SampleAttribute kMachine[] = {
     {DCM_SoftwareVersions, "2.0"},
     {DCM_BodyPartExamined, "CHEST"},
     {DCM_PresentationIntentType, "FOR PRESENTATION"},
+    // High values are shown dark, as much radiation is on film.
     {DCM_PhotometricInterpretation, "MONOCHROME1"},
     {DCM_BurnedInAnnotation, "NO"},
     {DCM_LossyImageCompression, "00"},
@@ -59,6 +61,7 @@ const SampleEllipse kFromTheSide[] = {
     {-0.18, 0.32, 0.26, 0.26, 1300}, {0.55, 0.00, 0.09, 1.20, 900},    {0, 1.00, 0.64, 0.32, 1000},
 };
 
+// Rows, columns, description, type, origin, bits and position of the first overlay's plane.
 const SampleAttribute kOverlay[] = {
     {DcmTagKey(0x6000, 0x0010), "16", EVR_US},    {DcmTagKey(0x6000, 0x0011), "16", EVR_US},
     {DcmTagKey(0x6000, 0x0022), "Side", EVR_LO},  {DcmTagKey(0x6000, 0x0040), "G", EVR_CS},
@@ -76,6 +79,7 @@ struct View
 QVector<Uint16> sideMarker()
 {
     QVector<Uint16> rows(16, 0);
+    // The upright stroke; the foot of the letter follows.
     for (int row = 2; row < 12; ++row)
         rows[row] = 0x0018;
     rows[12] = rows[13] = 0x0FF8;
@@ -90,6 +94,7 @@ void addCurve(SampleDataset& dataset)
         const double x = i / (kLutEntries - 1.0);
         curve.append(static_cast<Uint16>(4095 * x * x * (3 - 2 * x)));
     }
+    // The descriptor: number of entries, first value, bits of an entry.
     dataset.item(DCM_VOILUTSequence)
         .with(DcmTag(DCM_LUTDescriptor, EVR_US), QByteArray::number(kLutEntries) + "\\0\\12")
         .with(DCM_LUTExplanation, "Film")
@@ -123,6 +128,7 @@ void writeRadiographStudy(const SampleStudy& study, SampleFolder& folder)
                                  SampleEncoding::ExplicitWithLengths};
     SampleObject front(series, 1, 2);
     describeFilm(front, study, {"PA", "L\\F"});
+    // Only the first of the two has an overlay, so it cannot be the study's.
     front.dataset().withAll(kOverlay).withWords(DcmTag(0x6000, 0x3000, EVR_OW), sideMarker());
     SamplePicture(kColumns, kRows, 3900)
         .paintAll(kFromTheFront)
@@ -132,6 +138,7 @@ void writeRadiographStudy(const SampleStudy& study, SampleFolder& folder)
 
     SampleObject side(series, 2, 50);
     describeFilm(side, study, {"LL", "P\\F"});
+    // The correction is told of one image only.
     study.describeCorrection(side.dataset());
     SamplePicture(kColumns, kRows, 3900)
         .paintAll(kFromTheSide)

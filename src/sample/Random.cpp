@@ -12,10 +12,12 @@ namespace Kdd
 namespace
 {
 
+// The name space of all sample UIDs; with another one every UID would be another.
 const QUuid kNamesOfSamples("{6f2c9c2e-58a1-4c0b-9a37-1d0e5b7c42f3}");
 
 std::uint32_t seedOf(const QByteArray& name)
 {
+    // Not by std::hash, whose values differ from one library to the next.
     return qFromLittleEndian<quint32>(QCryptographicHash::hash(name, QCryptographicHash::Sha1).constData());
 }
 
@@ -45,12 +47,14 @@ int SampleRandom::between(int first, int last)
 
 double SampleRandom::noise()
 {
+    // The difference of two even distributions is a triangle around 0.
     const double one = fraction();
     return one - fraction();
 }
 
 double SampleRandom::fraction()
 {
+    // The engine gives 32 bits; divided by 2^32 they never reach 1.
     return static_cast<std::uint32_t>(mEngine()) / 4294967296.0;
 }
 
@@ -58,6 +62,7 @@ QByteArray sampleUid(const QByteArray& name)
 {
     QByteArray number = QUuid::createUuidV5(kNamesOfSamples, name).toRfc4122();
     QByteArray digits;
+    // Until the number is used up; that of a name is never 0.
     while (number.count('\0') < number.size())
         digits.append(takeLastDigit(number));
     std::reverse(digits.begin(), digits.end());

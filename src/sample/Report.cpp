@@ -28,6 +28,7 @@ const SampleCode kConclusion = {"121077", "DCM", "Conclusion"};
 const SampleCode kImage = {"121080", "DCM", "Best illustration of finding"};
 const SampleCode kMillimetre = {"mm", "UCUM", "millimeter"};
 
+// Longer than most values, with line ends in it, and within what a tag file keeps.
 const char* const kLongFinding = "In the right lower lobe lies a round nodule that is clearly delimited and "
                                  "not calcified. It lies against the "
                                  "pleura, which is not thickened. There are no further nodules, no effusion "
@@ -39,6 +40,7 @@ const char* const kLongFinding = "In the right lower lobe lies a round nodule th
 SampleDataset content(SampleDataset& parent, const char* type, const SampleCode& name)
 {
     SampleDataset item = parent.item(DCM_ContentSequence);
+    // Each item says how it belongs to the one above it, of what kind it is and what it is called.
     item.with(DCM_RelationshipType, "CONTAINS").with(DCM_ValueType, type);
     return item.withCode(DCM_ConceptNameCodeSequence, name);
 }
@@ -63,16 +65,19 @@ void addFindings(SampleDataset& document, const SampleSeries& slices, SampleRand
     content(nodule, "TEXT", kFinding).with(DCM_TextValue, kLongFinding);
     content(nodule, "CODE", kFinding)
         .item(DCM_ConceptCodeSequence)
+        // Too long for the usual code value, so it stands in the attribute for long ones.
         .with(DCM_LongCodeValue, "round-nodule/clearly-delimited")
         .with(DCM_CodingSchemeDesignator, "99SAMPLE")
         .with(DCM_CodeMeaning, "Clearly delimited round nodule");
     addDistance(nodule, random);
     SampleDataset image = content(nodule, "IMAGE", kImage);
+    // The report points to one image, whose series and study it names as evidence below.
     slices.refer(image, DCM_ReferencedSOPSequence, 2);
 }
 
 void addEvidence(SampleDataset& document, const SampleSeries& slices)
 {
+    // What the report refers to is listed once more, below its study and its series.
     SampleDataset study = document.item(DCM_CurrentRequestedProcedureEvidenceSequence);
     study.with(DCM_StudyInstanceUID, slices.study.uid("study"));
     SampleDataset series = study.item(DCM_ReferencedSeriesSequence);

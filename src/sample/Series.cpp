@@ -10,6 +10,7 @@ namespace Kdd
 namespace
 {
 
+/// UIDs and everything random are made of these two names, so another wording would change all of them.
 QByteArray seriesPart(int series)
 {
     return "series " + QByteArray::number(series);
@@ -72,6 +73,7 @@ SampleObject::SampleObject(const SampleSeries& series, int instance, double seco
     : mSeries(series)
     , mInstance(instance)
     , mDataset(*mFile.getDataset())
+    // Named after its place in the study, so that it draws the same numbers whatever else is written.
     , mRandom(series.study.name(instancePart(series.number, instance)))
 {
     const QByteArray time = series.study.time(series.delay + second);
@@ -79,6 +81,7 @@ SampleObject::SampleObject(const SampleSeries& series, int instance, double seco
     mDataset.with(DCM_SOPInstanceUID, series.instanceUid(instance))
         .with(DCM_InstanceNumber, instance)
         .with(DCM_InstanceCreationDate, kSampleDate)
+        // A scanner needs its time to make the object of what it has recorded.
         .with(DCM_InstanceCreationTime, series.study.time(series.delay + second + 2.5))
         .with(DCM_ContentDate, kSampleDate)
         .with(DCM_ContentTime, time);

@@ -22,6 +22,7 @@ namespace Kdd
 namespace
 {
 
+// Beyond it there are further sets of studies and not longer series.
 constexpr int kLargestSet = 1000;      // [images]
 constexpr int kOpening = 7 * 60 * 60;  // [s] after midnight
 constexpr int kClosing = 17 * 60 * 60;
@@ -43,6 +44,7 @@ const Kind kKinds[] = {
     {"MR", SampleCharset::Cyrillic, "MR head", 5, 30, writeMrStudy},
     {"US", SampleCharset::Japanese, "Abdomen", 2, 0, writeUltrasoundStudy},
     {"MG", SampleCharset::Greek, "Mammogram both sides", 4, 0, writeMammogramStudy},
+    // Two studies of the kind, hence the numbers in their names.
     {"DX", SampleCharset::Utf8, "Chest in two planes", 2, 0, writeRadiographStudy},
     {"DX", SampleCharset::Latin1, "Chest in two planes", 2, 0, writeRadiographStudy},
     {"SC", SampleCharset::Ascii, "Documents", 1, 0, writeCaptureStudy},
@@ -76,6 +78,7 @@ SampleStudy newStudy(const Kind& kind, int set, unsigned seed, int number)
     study.directory = QStringLiteral("%1-%2").arg(QLatin1String(kind.name)).arg(number);
     study.patient = samplePatient(seed, set, kind.patient);
     study.description = kind.description;
+    // Drawn by the study's own name, so that another number of images does not move it.
     study.startSecond = SampleRandom(study.name("start")).between(kOpening, kClosing);
     return study;
 }
@@ -84,6 +87,7 @@ void planSet(Plan& plan, int set, int images, unsigned seed)
 {
     const int first = plan.studies.size();
     const int rest = restOf(images);
+    // What rounding leaves goes to the first study, so that the sum is right.
     int left = rest;
     for (const Kind& kind : kKinds) {
         const int share = rest * kind.share / 100;
@@ -100,6 +104,7 @@ void planSet(Plan& plan, int set, int images, unsigned seed)
 Plan planStudies(const SampleOptions& options)
 {
     Plan plan;
+    // As few sets as hold all images, and these as even as whole numbers allow.
     const int sets = (options.images - 1) / kLargestSet + 1;
     for (int set = 1; set <= sets; ++set)
         planSet(plan, set, options.images / sets + (set <= options.images % sets ? 1 : 0), options.seed);
@@ -134,6 +139,7 @@ Result writeSampleStudies(const QString& folder, const SampleOptions& options,
     } catch (const SampleFault& fault) {
         result = Result::failure(fault.sentence());
     }
+    // Also after a fault: what has been written lies there.
     summary = files.summary();
     return result;
 }

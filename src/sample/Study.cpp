@@ -18,10 +18,12 @@ const char* const kSampleDate = "20240517";
 namespace
 {
 
+// Times are told in four decimals, and counted in whole steps so that no rounding shows.
 constexpr qint64 kTicksPerSecond = 10000;
 
 const SampleAttribute kVisit[] = {
     {DCM_InstitutionName, "Sample Clinic"},
+    // Texts of this kind may have line ends.
     {DCM_InstitutionAddress, "1 Hospital Road\r\nNorthfield"},
     {DCM_InstitutionalDepartmentName, "Radiology"},
     {DCM_PhysiciansOfRecord, ""},
@@ -38,6 +40,7 @@ const SampleCode kProtocol = {"P100", "99SAMPLE", "Routine protocol"};
 const SampleCode kContrast = {"Q7", "99SAMPLE", "Is contrast agent to be given?"};
 const SampleCode kNoContrast = {"A2", "99SAMPLE", "No, the kidneys do not allow it"};
 
+// Its umlaut has other bytes in each of the two sets.
 const char* const kNameBefore = "Unbekannt^Männlich";
 
 // The name before the correction came from another system and kept that system's character set.
@@ -50,6 +53,7 @@ SampleCharset otherCharset(SampleCharset charset)
 
 QByteArray SampleStudy::name(const QByteArray& part) const
 {
+    // Everything random is drawn by such a name, and UIDs are made of it.
     return part + " of " + directory.toLatin1() + " of " + QByteArray::number(seed);
 }
 
@@ -61,6 +65,7 @@ QByteArray SampleStudy::uid(const QByteArray& part) const
 QByteArray SampleStudy::time(double second) const
 {
     const qint64 ticks = startSecond * kTicksPerSecond + std::llround(second * kTicksPerSecond);
+    // A series after midnight has a time of the same day; dates stay as they are.
     const qint64 clock = ticks / kTicksPerSecond % (24 * 60 * 60);
     const qint64 digits = clock / 3600 * 10000 + clock / 60 % 60 * 100 + clock % 60;
     return QByteArray::number(digits).rightJustified(6, '0') + '.' +
@@ -83,6 +88,7 @@ void SampleStudy::describe(SampleDataset& dataset) const
         .with(DCM_AccessionNumber, accessionNumber())
         .with(DCM_RequestingPhysician, patient.physician)
         .withAll(kVisit);
+    // Retired, and met in files all the same.
     dataset.item(DCM_ReferencedStudySequence)
         .with(DCM_ReferencedSOPClassUID, UID_RETIRED_DetachedStudyManagementSOPClass)
         .with(DCM_ReferencedSOPInstanceUID, uid("referenced study"));
@@ -98,6 +104,7 @@ void SampleStudy::describeRequest(SampleDataset& dataset) const
         .with(DCM_PerformedProcedureStepDescription, description);
     dataset.withCode(DCM_ProcedureCodeSequence, kProtocol);
 
+    // Sequences four deep inside each other, the same in all images of a study.
     SampleDataset request = dataset.item(DCM_RequestAttributesSequence);
     request.with(DCM_RequestedProcedureDescription, description)
         .with(DCM_ScheduledProcedureStepDescription, description)
@@ -121,6 +128,7 @@ void SampleStudy::describeCorrection(SampleDataset& dataset) const
         .with(DCM_ModifyingSystem, "SAMPLE ARCHIVE")
         .with(DCM_SourceOfPreviousValues, "")
         .with(DCM_ReasonForTheAttributeModification, "CORRECT");
+    // Inside the item the texts are in the character set that the item names.
     correction.item(DCM_ModifiedAttributesSequence)
         .with(DCM_SpecificCharacterSet, specificCharacterSet(before))
         .with(DCM_PatientName, inCharset(before, kNameBefore))

@@ -14,6 +14,7 @@ namespace Kdd
 namespace
 {
 
+// These three also stand in the tables below, which know texts only.
 constexpr int kColumns = 64;
 constexpr int kRows = 48;
 constexpr int kFrames = 4;
@@ -36,6 +37,7 @@ const SampleAttribute kMachine[] = {
     {DCM_PatientOrientation, ""},
     {DCM_BurnedInAnnotation, "NO"},
     {DCM_LossyImageCompression, "00"},
+    // The increments stand in the attribute that is pointed to, one for each frame.
     {DCM_FrameIncrementPointer, "(0018,1065)"},
     {DCM_FrameTimeVector, "0\\33.3\\33.3\\33.4"},
     {DCM_CineRate, "30"},
@@ -92,9 +94,11 @@ bool isWithin(int x, int y, int centreX, int centreY, int radius)
 // What the beam meets `x` pixels beside the middle and `y` below the top; it fades with the depth.
 Colour echo(int x, int y, int frame, Flow flow, SampleRandom& random)
 {
+    // Counted from the tip of the beam, which lies above the picture.
     const int squared = x * x + (y + 6) * (y + 6);
     if (5 * std::abs(x) > 4 * (y + 6) || squared > (kDeepest + 6) * (kDeepest + 6) || squared < 64)
         return {0, 0, 0};
+    // The vessel moves from frame to frame, and its flow turns.
     if (flow == Flow::Coloured && isWithin(x, y, 9 + frame, 26, 4))
         return frame % 2 == 0 ? Colour{210, 40 + 10 * frame, 20} : Colour{30, 60, 220};
     int grey = 150 - 2 * y + random.between(-45, 45);
@@ -107,6 +111,7 @@ Colour echo(int x, int y, int frame, Flow flow, SampleRandom& random)
 QByteArray clip(Flow flow, SampleRandom& random)
 {
     QByteArray pixels;
+    // Red, green and blue of each pixel side by side, frame after frame.
     pixels.reserve(kFrames * kRows * kColumns * 3);
     for (int frame = 0; frame < kFrames; ++frame) {
         for (int y = 0; y < kRows; ++y) {
@@ -128,6 +133,7 @@ void writeClip(const SampleSeries& series, int instance, Flow flow, SampleFolder
         .with(DCM_AcquisitionDateTime,
               QByteArray(kSampleDate) + series.study.time(series.delay + instance * 21))
         .with(DCM_StageName, flow == Flow::Hidden ? "Grey" : "Flow")
+        // In place of what the table says, because the grey clip has none.
         .with(DCM_UltrasoundColorDataPresent, flow == Flow::Hidden ? 0 : 1);
     dataset.item(DCM_SequenceOfUltrasoundRegions).withAll(kRegion);
     dataset.withBytes(DcmTag(DCM_PixelData, EVR_OB), clip(flow, object.random()));

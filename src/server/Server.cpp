@@ -5,6 +5,7 @@
 #include "server/Router.h"
 #include "server/StatusPages.h"
 #include "server/ViewerFiles.h"
+#include "server/browser/BrowserService.h"
 #include "server/dicomweb/DicomWebService.h"
 #include "server/http/HttpServer.h"
 
@@ -83,7 +84,12 @@ struct Server::Private
         , http(settings.http, guard, log)
     {
         router.add(prefix,
-                   std::make_unique<DicomWeb::DicomWebService>(prefix.size(), makeResources({metrics})));
+                   std::make_unique<DicomWeb::DicomWebService>(prefix.size(), makeResources(archive)));
+        Browser::BrowserSettings browser;
+        browser.dicomWeb = prefix.toList().join('/');
+        browser.hasViewer = !settings.viewer.isEmpty();
+        browser.hasThumbnails = true;
+        router.add({}, std::make_unique<Browser::BrowserService>(*archive.studies, browser));
         if (settings.status)
             status = std::make_unique<Http::HttpServer>(statusSettings(settings), statusGuard, unobserved);
         metrics.addGauge("kdd_http_connections", "Connections that are open.",
@@ -93,6 +99,7 @@ struct Server::Private
     }
 
     QVector<QByteArray> prefix;
+    ServedArchive archive;
     Http::Metrics metrics;
     RequestLog log;
     Unobserved unobserved;

@@ -1,6 +1,7 @@
 #include "SampleArchive.h"
 
 #include "kddlib/tagfile/TagFile.h"
+#include "support/ServiceAccount.h"
 
 #include <QFileInfo>
 #include <QRegularExpression>
@@ -34,7 +35,7 @@ SampleArchive::SampleArchive()
     putBeside("job.xml", kJob);
     putBeside("images.txt", kImage);
     putBeside("scan.dcm", "of this machine");
-    addAccount();
+    putBeside("account.json", QJsonDocument(ServiceAccount().key(mTokens.url(""))).toJson());
 }
 
 void SampleArchive::fill()
@@ -47,28 +48,9 @@ void SampleArchive::fill()
     EXPECT_TRUE(QFile::copy(TagFile::cacheFilePathForStudy(kStudy), path("copy.tc")));
 }
 
-void SampleArchive::addAccount()
-{
-    const Answer key = run(QStringLiteral("openssl"),
-                           {QStringLiteral("genpkey"), QStringLiteral("-algorithm"), QStringLiteral("RSA")});
-    const QJsonObject account{{QStringLiteral("type"), QStringLiteral("service_account")},
-                              {QStringLiteral("private_key_id"), QStringLiteral("k1")},
-                              {QStringLiteral("private_key"), QString::fromLatin1(key.out)},
-                              {QStringLiteral("client_email"), QStringLiteral("robot@hospital")},
-                              {QStringLiteral("token_uri"), QString::fromStdString(mTokens.url(""))}};
-    putBeside("account.json", QJsonDocument(account).toJson());
-}
-
-void SampleArchive::putBeside(const char* name, const QByteArray& content) const
-{
-    QFile file(path(name));
-    ASSERT_TRUE(file.open(QIODevice::WriteOnly));
-    ASSERT_EQ(file.write(content), content.size());
-}
-
 Answer SampleArchive::run(const QString& program, const QStringList& arguments) const
 {
-    Process process(kNoLimit);
+    QProcess process;
     process.setWorkingDirectory(mFolder.path());
     process.setProcessEnvironment(mEnvironment);
     process.start(program, arguments);

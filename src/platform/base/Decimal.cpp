@@ -24,7 +24,9 @@ QVector<double> numbersOf(const QByteArray& text)
     const QList<QByteArray> words = text.split('\\');
     for (const QByteArray& word : words) {
         bool ok = false;
+        // Qt reads a byte array's number with a point, whatever locale the process has.
         numbers.append(word.trimmed().toDouble(&ok));
+        // One that is no number spoils the list, because the others would move to wrong places.
         if (!ok || !std::isfinite(numbers.last()))
             return {};
     }

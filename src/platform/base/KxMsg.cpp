@@ -5,6 +5,7 @@
 namespace Kdd
 {
 
+/// Every number goes through here and is taken below, so the order of bytes is decided in two places only.
 template <typename T>
 KxMsg& KxMsg::put(T value)
 {
@@ -16,6 +17,7 @@ KxMsg& KxMsg::put(T value)
 template <typename T>
 KxMsg& KxMsg::take(T& value)
 {
+    // Set in any case, so that whoever asks for a failure only at the end has read nothing undefined.
     value = T();
     if (!has(static_cast<qint64>(sizeof value)))
         return *this;
@@ -129,6 +131,7 @@ QByteArray KxMsg::read(qint64 count)
 KxMsg KxMsg::readMessage(qint64 count)
 {
     if (!has(count)) {
+        // Both have failed: the part has nothing to give, and what follows it is out of step.
         KxMsg failed;
         failed.setFailed();
         return failed;

@@ -18,6 +18,7 @@ namespace Kdd
 namespace
 {
 
+// So the files take 40 MiB at most.
 constexpr std::size_t kRotatedSize = 10 * 1024 * 1024;
 constexpr std::size_t kRotatedFiles = 3;
 
@@ -30,6 +31,7 @@ struct Settings
     std::string droppedCategory;
 };
 
+/// Read without a lock, since all of it is set before there are several threads.
 Settings& settings()
 {
     static Settings instance;
@@ -92,12 +94,15 @@ spdlog::logger& logger()
                 sinks.push_back(std::make_shared<spdlog::sinks::rotating_file_sink_mt>(path, kRotatedSize,
                                                                                        kRotatedFiles));
             } catch (const spdlog::spdlog_ex& failure) {
+                // A log file that cannot be made is told on standard error. The work itself goes on.
                 fault = failure.what();
             }
         }
         auto made = std::make_shared<spdlog::logger>("kdd", sinks.begin(), sinks.end());
+        // Which lines are wanted is decided before they get here.
         made->set_level(spdlog::level::trace);
         made->set_pattern("%Y-%m-%d %H:%M:%S.%e %^%l%$ %v");
+        // What may be the last line before a crash is not held back.
         made->flush_on(spdlog::level::warn);
         if (!fault.empty())
             made->error("The log file cannot be written: {}", fault);
@@ -108,6 +113,7 @@ spdlog::logger& logger()
 
 std::string formatted(const char* format, va_list arguments)
 {
+    // A list of arguments can be walked once only, and is needed for the length and for the text.
     va_list again;
     va_copy(again, arguments);
     // NOLINTNEXTLINE(clang-analyzer-valist.Uninitialized): the caller has started the list
@@ -144,6 +150,7 @@ std::string lineOf(const char* format, va_list arguments)
     if (original.find('\n') == std::string::npos)
         return LogFile::escaped(formatted(format, arguments));
     std::string marked = original;
+    // Any character would do that is no part of a conversion.
     std::replace(marked.begin(), marked.end(), '\n', '|');
     va_list again;
     va_copy(again, arguments);
@@ -153,6 +160,7 @@ std::string lineOf(const char* format, va_list arguments)
     return escapedBut(text, [&](std::size_t i) { return other.size() == text.size() && other[i] == '|'; });
 }
 
+/// Asked before a line is put together, which costs far more than the question.
 bool isWanted(LogFile::Severity severity, const char* category)
 {
     const Settings& current = settings();
@@ -226,6 +234,7 @@ std::string LogFile::escaped(const std::string& text)
 void LogFile::setLevel(Level level)
 {
     settings().level = level;
+    // Whoever wants it otherwise says so afterwards.
     settings().isDebugWanted = level >= Level::Timing;
 }
 

@@ -36,8 +36,10 @@ uint8_t* bytesOf(QByteArray& array)
 }
 
 /// The index is the last part before the footer; null when either is damaged.
+/// The footer tells how long the index is; the decoder must end just where the footer begins.
 Index readIndex(const QByteArray& in, const lzma_stream_flags& footer)
 {
+    // The length in the footer is a claim, held against what stands before the footer.
     const auto end = static_cast<size_t>(in.size()) - LZMA_STREAM_HEADER_SIZE;
     if (footer.backward_size > end)
         return nullptr;
@@ -64,6 +66,7 @@ std::optional<uint64_t> contentLength(const QByteArray& in)
     const Index index = readIndex(in, footer);
     if (!index)
         return {};
+    // The sum over all blocks, so that memory is taken once and its size is known before.
     return lzma_index_uncompressed_size(index.get());
 }
 
@@ -86,6 +89,7 @@ QByteArray lzmaCompress(const QByteArray& bytes)
         return emptyContent();
     const auto size = static_cast<size_t>(bytes.size());
     const size_t bound = lzma_stream_buffer_bound(size);
+    // 0 stands for a size that the library does not take.
     if (bound == 0 || bound > kMaxArray)
         return {};
 

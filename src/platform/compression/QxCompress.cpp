@@ -30,6 +30,7 @@ struct Free
 using Compressor = std::unique_ptr<libdeflate_compressor, Free>;
 using Decompressor = std::unique_ptr<libdeflate_decompressor, Free>;
 
+/// By the announced length alone, before memory is taken for it.
 bool isPlausible(qint64 length, qint64 compressed, qint64 limit)
 {
     return length <= limit && length <= kMaxArray && length <= compressed * kMaxExpansion;
@@ -42,6 +43,7 @@ QByteArray qxCompress(const unsigned char* data, int size)
     const Compressor compressor(libdeflate_alloc_compressor(kLevel));
     if (size < 0 || !compressor)
         return {};
+    // Nothing may come as a null pointer, which the compressor is never given.
     const void* from = size > 0 ? static_cast<const void*>(data) : "";
     const size_t bound = libdeflate_zlib_compress_bound(compressor.get(), static_cast<size_t>(size));
     if (bound > static_cast<size_t>(kMaxArray - kLengthSize))
@@ -51,6 +53,7 @@ QByteArray qxCompress(const unsigned char* data, int size)
     qToBigEndian(static_cast<quint32>(size), out.data());
     const size_t written = libdeflate_zlib_compress(compressor.get(), from, static_cast<size_t>(size),
                                                     out.data() + kLengthSize, bound);
+    // The bound leaves room for every content, so this is a failure of the library and never a full buffer.
     if (written == 0)
         return {};
     out.resize(kLengthSize + static_cast<int>(written));

@@ -8,6 +8,7 @@ namespace Kxg
 namespace
 {
 
+// In the order in which correctionOf reads them.
 const char kColumns[] =
     "SELECT study_uid, image, shown_study_uid, shown_series_uid, shown_image, changes, id FROM correction";
 
@@ -50,6 +51,7 @@ struct FileRow
 std::vector<FileRow> filesOf(SqlConnection& connection, const Place& place, const ImageCorrection& correction)
 {
     std::vector<FileRow> files;
+    // The first half finds what the earlier correction moved, the second what is listed where its file says.
     SqlRows rows =
         connection.ask("SELECT path, sop_uid, series_id, registered FROM file WHERE correction_id = ?"
                        " UNION ALL SELECT file.path, file.sop_uid, file.series_id, file.registered"
@@ -74,6 +76,8 @@ QByteArray seriesUIDOf(SqlConnection& connection, qint64 seriesId)
 /// The volume files that hold a series' images hold them still when they stand in another series.
 void shareVolumes(SqlConnection& connection, qint64 fromSeries, qint64 toSeries)
 {
+    // A server takes a bare value in a selection for a text, hence the casts. Several images of one series
+    // share once.
     connection.change("INSERT INTO volume_share (path, series_id)"
                       " SELECT path, CAST(? AS BIGINT) FROM file WHERE series_id = ? AND kind = 2"
                       " UNION SELECT path, CAST(? AS BIGINT) FROM volume_share WHERE series_id = ?"
@@ -95,6 +99,7 @@ struct NewPlace
 void moveFiles(SqlConnection& connection, const std::vector<FileRow>& files, const NewPlace& place)
 {
     const QByteArray& sopUID = place.sopUID;
+    // An image without UID stands by its path and replaces none.
     if (!sopUID.isEmpty())
         connection.change("UPDATE file SET is_shown = 0 WHERE sop_uid = ? AND kind = 1 AND series_id IN"
                           " (SELECT id FROM series WHERE study_id = ?)",
@@ -119,6 +124,7 @@ QVariant keep(SqlConnection& connection, const ImageCorrection& correction)
         connection.change("DELETE FROM correction WHERE study_uid = ? AND image = ?", key);
         return QVariant(QVariant::LongLong);
     }
+    // The id stays when a correction is replaced: the files that it moved know it by that.
     SqlRows kept = connection.ask(
         "INSERT INTO correction"
         " (study_uid, image, shown_study_uid, shown_series_uid, shown_image, changes)"
@@ -141,15 +147,18 @@ void recordCorrection(SqlConnection& connection, const ImageCorrection& correcti
     const qint64 oldStudy = findStudyId(connection, before.studyUID);
     const qint64 newStudy = obtainStudy(connection, correction.shownStudyUID).id;
     touched.insert(newStudy);
+    // Nothing is registered of that study. What is kept counts for files that come later.
     if (oldStudy == 0)
         return;
     touched.insert(oldStudy);
     const std::vector<FileRow> files = filesOf(connection, before, correction);
+    // The files may stay where they are, but no correction puts them there any more.
     if (correctionId.isNull())
         connection.change("UPDATE file SET correction_id = NULL WHERE correction_id = ?",
                           {before.correctionId});
     if (files.empty())
         return;
+    // A correction without a series leaves the image in the series of the same UID, in the new study.
     const qint64 newSeries =
         obtainSeries(connection, newStudy,
                      correction.shownSeriesUID.isEmpty() ? seriesUIDOf(connection, files.back().seriesId)

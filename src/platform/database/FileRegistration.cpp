@@ -73,16 +73,20 @@ void FileRegistration::run(const FileRecords& files, RegistrationOutcome& outcom
 {
     mOutcome = &outcome;
     std::vector<Entry> entries = inOrder(files);
+    // Without any, no file has to be looked up.
     if (hasCorrections(mConnection))
         followCorrections(entries);
+    // Given out by path: of several new files of one image the last by path is the one that is shown.
     mNumber = takeRegistrationNumbers(mConnection, static_cast<qint64>(entries.size()));
     for (auto from = entries.begin(); from != entries.end();) {
         const auto to = entries.end() - from >= kFilesAtOnce ? from + kFilesAtOnce : from + 1;
         put({from, to});
         from = to;
     }
+    // Only now, since a later portion may take away the file that would be next.
     for (const Image& image : qAsConst(mLeft))
         showNewest(mConnection, image.first, image.second);
+    // A set has no order, and requests are served in the order in which they are left.
     QList<qint64> touched = mTouched.values();
     std::sort(touched.begin(), touched.end());
     for (const qint64 studyId : qAsConst(touched))
@@ -93,6 +97,7 @@ void FileRegistration::run(const FileRecords& files, RegistrationOutcome& outcom
 void FileRegistration::followCorrections(std::vector<Entry>& entries)
 {
     QList<QByteArray> images;
+    // By what the file says of itself, which is the key of a correction.
     for (const Entry& entry : entries)
         images.append(entry.sopUID.isEmpty() ? entry.path : entry.sopUID);
     QHash<QPair<QByteArray, QByteArray>, KeptCorrection> known;
@@ -104,12 +109,14 @@ void FileRegistration::followCorrections(std::vector<Entry>& entries)
         if (entry.kind != FileKind::Dicom || found == known.cend())
             continue;
         const ImageCorrection& correction = found->correction;
+        // Told only when the image went to another study, where nobody would look for the file.
         if (correction.shownStudyUID != entry.studyUID)
             mOutcome->conflicts.push_back({FileConflict::Kind::FollowsCorrection, entry.path, entry.sopUID,
                                            entry.studyUID, QByteArray(), correction.shownStudyUID});
         entry.studyUID = correction.shownStudyUID;
         if (!correction.shownSeriesUID.isEmpty())
             entry.seriesUID = correction.shownSeriesUID;
+        // The path stands for an image without UID and must not become one.
         if (correction.shownImage != entry.path)
             entry.sopUID = correction.shownImage;
         entry.correctionId = found->id;
@@ -118,11 +125,13 @@ void FileRegistration::followCorrections(std::vector<Entry>& entries)
 
 void FileRegistration::put(std::vector<Entry> entries)
 {
+    // Before anything is written: afterwards only the new places are known.
     const QHash<QByteArray, Image> former = formerImages(entries);
     for (Entry& entry : entries) {
         if (entry.kind != FileKind::Other)
             place(entry);
         const Image before = former.value(entry.path);
+        // It left an image of which another file may have to be shown now.
         if (before.first != 0 && before != Image(entry.studyId, entry.sopUID))
             mLeft.insert(before);
     }
@@ -138,6 +147,7 @@ void FileRegistration::write(const std::vector<Entry>& entries)
                << static_cast<int>(entry.kind) << entry.seriesId << textValue(entry.sopUID) << mNumber++
                << (entry.isShown ? 1 : 0) << (entry.attributes && entry.attributes->isDamaged ? 1 : 0)
                << entry.correctionId;
+    // A row that exists is changed and not replaced: what other series share of a volume would go with it.
     mConnection.change(
         "INSERT INTO file (path, size, modified, kind, series_id, sop_uid, registered, is_shown,"
         " is_damaged, correction_id) VALUES " +
@@ -161,6 +171,7 @@ QHash<QByteArray, FileRegistration::Image> FileRegistration::formerImages(const 
                                        repeated("?", paths.size()) + ")",
                                    paths);
     while (rows.next()) {
+        // The study that a file leaves changes too.
         mTouched.insert(rows.number(1));
         if (rows.number(3) == static_cast<int>(FileKind::Dicom) && !rows.text(2).isEmpty())
             former.insert(rows.bytes(0), {rows.number(1), rows.text(2)});
@@ -171,6 +182,7 @@ QHash<QByteArray, FileRegistration::Image> FileRegistration::formerImages(const 
 /// The file registered last is the one that is shown of its image.
 void FileRegistration::settleConflicts(std::vector<Entry>& entries)
 {
+    // First the files of this portion among each other, then against those that are registered.
     QHash<QByteArray, std::vector<Entry*>> byImage;
     for (Entry& entry : entries) {
         if (!entry.isNamedImage())
@@ -178,6 +190,7 @@ void FileRegistration::settleConflicts(std::vector<Entry>& entries)
         std::vector<Entry*>& same = byImage[entry.sopUID];
         for (Entry* other : same)
             tellConflict(entry, *other);
+        // In different studies both are shown.
         for (Entry* other : same)
             other->isShown = other->isShown && other->studyId != entry.studyId;
         same.push_back(&entry);
@@ -185,9 +198,11 @@ void FileRegistration::settleConflicts(std::vector<Entry>& entries)
     if (byImage.isEmpty())
         return;
     QVariantList uids;
+    // All entries, so that the statement has one number of values. What has no UID finds nothing.
     for (const Entry& entry : entries)
         uids << textValue(entry.sopUID);
     QList<QByteArray> replaced;
+    // All rows are read before the next statement runs over the connection.
     {
         SqlRows rows = mConnection.ask("SELECT file.path, file.sop_uid, series.study_id, study.uid FROM file"
                                        " JOIN series ON series.id = file.series_id"
@@ -199,6 +214,8 @@ void FileRegistration::settleConflicts(std::vector<Entry>& entries)
         while (rows.next()) {
             Entry other;
             other.path = rows.bytes(0);
+            // Its row is about to be overwritten, so it counts as the entry of the same path and not as
+            // another file.
             const bool isTakenAnew = std::any_of(entries.begin(), entries.end(),
                                                  [&](const Entry& each) { return each.path == other.path; });
             if (isTakenAnew)
@@ -229,6 +246,7 @@ void FileRegistration::place(Entry& entry)
     KeptNode& study = knownStudy(entry.studyUID);
     KeptNode& series = knownSeries(study.id, entry.seriesUID);
     mTouched.insert(study.id);
+    // The first file that says something of them; what the built tag file shows takes its place later.
     if (entry.attributes && !study.isDescribed) {
         describeStudy(mConnection, study.id, *entry.attributes);
         study.isDescribed = true;

@@ -26,6 +26,7 @@ struct StudyFiles
     std::set<std::string> withVolume;  // series, in the order of their bytes
 };
 
+/// All in the caller's transaction, so that the lists belong together whatever is registered meanwhile.
 StudyFiles readFiles(SqlConnection& connection, int studyId)
 {
     StudyFiles files;
@@ -35,6 +36,7 @@ StudyFiles readFiles(SqlConnection& connection, int studyId)
     files.volumes = pathsOf(volumes);
     for (const ListedVolume& volume : volumes)
         files.withVolume.insert(volume.seriesInstanceUID.toStdString());
+    // The database orders by bytes and knows nothing of part numbers.
     std::sort(files.volumes.begin(), files.volumes.end(), Kdd::isEarlierPart);
     // Without files it is about to be forgotten.
     if (files.dicom.empty() && files.volumes.empty())
@@ -62,6 +64,7 @@ DicomDirectoryEntry volumeEntry(const DicomDirectoryEntry& series, const QByteAr
     DicomDirectoryEntry file;
     file.type = DicomDirectoryEntry::VolumeFile;
     file.flags = DicomDirectoryEntry::HasVolume;
+    // The directory shows names; the path itself is asked for with the files of the study.
     file.name = path.mid(path.lastIndexOf('/') + 1);
     file.studyInstanceUID = series.studyInstanceUID;
     file.seriesInstanceUID = series.seriesInstanceUID;
@@ -81,11 +84,13 @@ void readSeries(SqlConnection& connection, qint64 studyId, DicomDirectoryEntry& 
 void readVolumes(SqlConnection& connection, qint64 studyId, DicomDirectoryEntry& study)
 {
     QHash<QByteArray, DicomDirectoryEntry*> bySeries;
+    // The list of series does not grow from here on, so the places in it stay.
     for (DicomDirectoryEntry& series : study.entries)
         bySeries.insert(series.seriesInstanceUID, &series);
     for (const ListedVolume& volume : listVolumes(connection, studyId))
         if (DicomDirectoryEntry* series = bySeries.value(volume.seriesInstanceUID))
             series->entries.push_back(volumeEntry(*series, volume.path));
+    // Equal names in different folders keep the order of their paths.
     for (DicomDirectoryEntry& series : study.entries)
         std::stable_sort(series.entries.begin(), series.entries.end(),
                          [](const auto& a, const auto& b) { return Kdd::isEarlierPart(a.name, b.name); });
@@ -113,11 +118,13 @@ Kdd::Result GetCorrections(int studyId, QByteArray& studyUID, std::vector<ImageC
     return askDatabase([&](SqlConnection& connection) {
         QByteArray uid;
         {
+            // Read to its end before the next question is asked over the connection.
             SqlRows study = connection.ask("SELECT uid FROM study WHERE id = ?", {studyId});
             if (study.next())
                 uid = study.text(0);
         }
         std::vector<std::string> foreign;
+        // Shared with a series of this study, while its own series belongs to another one.
         SqlRows rows = connection.ask("SELECT DISTINCT file.path FROM series JOIN volume_share"
                                       " ON volume_share.series_id = series.id"
                                       " JOIN file ON file.path = volume_share.path"
@@ -169,10 +176,12 @@ Kdd::Result GetSeries(const QByteArray& studyUID, QMap<QByteArray, std::shared_p
 bool IsDamagedFile(const char* path)
 {
     Kdd::FileStatus status;
+    // Without a database no file was taken with tolerance.
     if (DatabaseServer().isEmpty() || !Kdd::statusOf(path, status))
         return false;
     bool isDamaged = false;
     const Kdd::Result result = askDatabase([&](SqlConnection& connection) {
+        // Size and time must be those of now, because a file that has changed is read strictly again.
         SqlRows rows = connection.ask(
             "SELECT 1 FROM file WHERE path = ? AND size = ? AND modified = ? AND is_damaged = 1",
             {bytesValue(path), status.size, status.modified});

@@ -19,6 +19,7 @@ public:
 
     bool tryLock(qint64 studyId) override
     {
+        // Never waiting in the server: whoever claims counts his patience himself.
         SqlRows rows = mConnection.ask("SELECT pg_try_advisory_lock(?, ?)", {kAdvisoryLocks, studyId});
         if (!rows.next() || !rows.truth(0))
             return false;

@@ -33,8 +33,10 @@ void openConnection(const QByteArray& address, const DatabaseAddress& parsed)
     ThreadConnection& own = threadConnection();
     if (own.connection && own.address == address)
         return;
+    // Another address than before ends the old connection, also when the new one cannot be opened.
     own = {};
     auto connection = std::make_unique<SqlConnection>(parsed, SqlConnection::IfAbsent::Fail);
+    // Asking changes no tables, so those of an older program are refused as well.
     requireCurrentSchema(*connection);
     own = {address, std::move(connection)};
 }
@@ -69,6 +71,7 @@ Kdd::Result askDatabase(const std::function<void(SqlConnection&)>& work)
 
 void noteUser(SqlConnection& connection, const QByteArray& user)
 {
+    // For the connection and not only for the transaction.
     if (connection.address().engine == DatabaseAddress::Engine::Postgres)
         connection.ask("SELECT set_config('application_name', ?, false)", {textValue("kdd " + user)});
 }

@@ -17,11 +17,13 @@ namespace
 
 QByteArray joined(const QSet<QByteArray>& texts)
 {
+    // A set has no order, and lists are to be the same each time.
     QList<QByteArray> sorted = texts.values();
     std::sort(sorted.begin(), sorted.end());
     return sorted.join(' ');
 }
 
+/// The root becomes an empty text, so that everything lies below it as below any folder.
 QByteArray withoutSlash(QByteArray path)
 {
     while (path.endsWith('/'))
@@ -35,6 +37,7 @@ const char kListSeries[] =
     " EXISTS (SELECT 1 FROM build_request WHERE build_request.study_id = study.id AND due <= ?),"
     " series.modality, SUM(CASE WHEN file.kind = 1 AND file.is_shown = 1 THEN 1 ELSE 0 END),"
     " SUM(CASE WHEN file.kind = 2 THEN 1 ELSE 0 END), study.tag_file_size, study.tag_file_digest"
+    // Joined with the files, so that a study that lost its last one is not listed.
     " FROM study JOIN series ON series.study_id = study.id JOIN file ON file.series_id = series.id"
     " GROUP BY study.id, series.id ORDER BY study.uid, series.id";
 
@@ -77,8 +80,10 @@ std::unique_ptr<Catalogue> Catalogue::openExisting(const QByteArray& address, Kd
 SqlCatalogue::SqlCatalogue(const DatabaseAddress& address, SqlConnection::IfAbsent ifAbsent)
     : mConnection(address, ifAbsent)
 {
+    // An empty file, or one of something else, is not made into a database that should be there already.
     if (ifAbsent == SqlConnection::IfAbsent::Fail)
         requireSchema(mConnection);
+    // Also in a database that was there: tables of an older program are changed, those of a newer one refused.
     bringSchemaUpToDate(mConnection);
 }
 
@@ -116,6 +121,7 @@ Kdd::Result Catalogue::registerFiles(const FileRecords& files, QMap<QByteArray, 
 Kdd::Result SqlCatalogue::registerFiles(const FileRecords& files, RegistrationOutcome& outcome)
 {
     RegistrationOutcome made;
+    // Filled aside: of a transaction that fails nothing is told.
     Kdd::Result result = transact(Access::Write, [&] { FileRegistration(mConnection).run(files, made); });
     if (result.good())
         outcome = std::move(made);
@@ -138,6 +144,7 @@ Kdd::Result SqlCatalogue::removeFiles(const QVector<QByteArray>& paths)
         }
         QMap<QByteArray, qint64> requests;
         for (const qint64 studyId : qAsConst(touched)) {
+            // Another file of the same image may take the place of the one that went.
             showNewestOfAll(mConnection, studyId);
             concludeChange(mConnection, studyId, requests);
         }
@@ -152,6 +159,7 @@ Kdd::Result SqlCatalogue::removeFiles(const QByteArray& studyUID, const QByteArr
         const QByteArray sql =
             "DELETE FROM file WHERE series_id IN (SELECT id FROM series WHERE study_id = ?" + condition;
         QMap<QByteArray, qint64> requests;
+        // Nothing was listed there, so there is nothing to build.
         if (mConnection.change(sql, QVariantList{studyId} + values) == 0)
             return;
         showNewestOfAll(mConnection, studyId);
@@ -172,6 +180,7 @@ Kdd::Result SqlCatalogue::removeSeries(const QByteArray& studyUID, const QByteAr
 Kdd::Result SqlCatalogue::removeImage(const QByteArray& studyUID, const QByteArray& sopUID)
 {
     return removeFiles(studyUID,
+                       // An image without UID is named by its path.
                        ") AND kind = 1 AND ((sop_uid = ? AND sop_uid <> '') OR (sop_uid = '' AND path = ?))",
                        {textValue(sopUID), bytesValue(sopUID)});
 }
@@ -219,6 +228,7 @@ Kdd::Result SqlCatalogue::studyContents(const QByteArray& studyUID, StudyContent
             contents.tagFile = {rows.number(0), rows.bytes(1)};
             contents.isWaiting = rows.truth(2);
         }
+        // What waits to settle is due at a time and not at 0.
         SqlRows changes = mConnection.ask(
             "SELECT id FROM build_request WHERE study_id = ? AND due = 0 ORDER BY id", {studyId});
         while (changes.next())
@@ -233,6 +243,7 @@ Kdd::Result SqlCatalogue::listStudies(std::vector<StudySummary>& studies)
         QSet<QByteArray> modalities;
         SqlRows rows = mConnection.ask(kListSeries, {presentMs()});
         while (rows.next()) {
+            // The series of one study come one after the other.
             if (list.empty() || list.back().id != rows.number(0)) {
                 list.push_back(summaryOf(rows));
                 modalities.clear();
@@ -240,6 +251,8 @@ Kdd::Result SqlCatalogue::listStudies(std::vector<StudySummary>& studies)
             StudySummary& study = list.back();
             if (!rows.text(6).isEmpty())
                 modalities.insert(rows.text(6));
+            // Put together again with each series, since the last row of a study does not show that it is the
+            // last.
             study.modalities = joined(modalities);
             study.images += static_cast<int>(rows.number(7));
             study.volumes += static_cast<int>(rows.number(8));
@@ -274,6 +287,7 @@ Kdd::Result SqlCatalogue::volumeFiles(const QByteArray& studyUID, QVector<QByteA
                                        {textValue(studyUID)});
         while (rows.next())
             found.push_back(rows.bytes(0));
+        // The database knows nothing of part numbers.
         std::sort(found.begin(), found.end(), Kdd::isEarlierPart);
         paths.swap(found);
     });

@@ -53,9 +53,11 @@ bool isFixedFile(const QString& path)
     const QByteArray folder = file.left(qMax(1, file.lastIndexOf('/')));
     std::error_code error;
     return ::access(file.constData(), R_OK) == 0 && ::access(folder.constData(), W_OK) != 0 &&
+           // The size of an absent log is -1 here, that of an empty one 0.
            std::filesystem::file_size((path + QLatin1String("-wal")).toStdString(), error) + 1 <= 1;
 }
 
+/// The address by which the engine makes no files beside this one and locks nothing.
 QString fixedFile(const QString& path)
 {
     return QLatin1String("file:") + QString::fromLatin1(path.toUtf8().toPercentEncoding("/")) +
@@ -141,9 +143,11 @@ SqlConnection::~SqlConnection() = default;
 
 void SqlConnection::reopen()
 {
+    mOnce.reset();
     mStatements.clear();
     mOpened.reset();
     const SqlDialect& dialect = SqlDialect::of(mAddress.engine);
+    // Opening would only say that no driver is loaded.
     if (!QSqlDatabase::isDriverAvailable(dialect.driver))
         throw DatabaseError(QStringLiteral("Qt's database driver %1 is not installed").arg(dialect.driver));
     if (mAddress.engine == DatabaseAddress::Engine::Sqlite)
@@ -175,7 +179,10 @@ void SqlConnection::begin(Access access)
     try {
         beginOnce(access);
     } catch (const DatabaseError&) {
+        // A connection that was lost since its last use shows here, when no work of the transaction is lost
+        // with it.
         rollBack();
+        // It lives, so the refusal is the engine's own, for example because others write.
         if (isAlive())
             throw;
         reopen();
@@ -197,6 +204,7 @@ void SqlConnection::transact(Access access, const std::function<void()>& work)
         work();
         execute(QStringLiteral("COMMIT"));
     } catch (...) {
+        // Whatever was thrown, no transaction may stay open: the connection is used again.
         rollBack();
         throw;
     }
@@ -211,12 +219,17 @@ QSqlQuery& SqlConnection::run(const QByteArray& sql, const QVariantList& values)
     auto found = mStatements.find(sql);
     if (found == mStatements.end()) {
         QSqlQuery query(mOpened->database);
+        // Rows come one by one and are not kept, since lists may be long.
         query.setForwardOnly(true);
         if (!query.prepare(QString::fromLatin1(sql)))
             throw errorOf(query.lastError());
         found = mStatements.emplace(sql, query).first;
     }
-    QSqlQuery& query = found->second;
+    return execute(found->second, values);
+}
+
+QSqlQuery& SqlConnection::execute(QSqlQuery& query, const QVariantList& values)
+{
     for (int i = 0; i < values.size(); ++i)
         query.bindValue(i, values[i]);
     if (!query.exec())
@@ -227,6 +240,17 @@ QSqlQuery& SqlConnection::run(const QByteArray& sql, const QVariantList& values)
 SqlRows SqlConnection::ask(const QByteArray& sql, const QVariantList& values)
 {
     return SqlRows(run(sql, values));
+}
+
+SqlRows SqlConnection::askOnce(const QByteArray& sql, const QVariantList& values)
+{
+    if (!mOpened)
+        throw DatabaseError(QStringLiteral("the connection is lost"));
+    mOnce = std::make_unique<QSqlQuery>(mOpened->database);
+    mOnce->setForwardOnly(true);
+    if (!mOnce->prepare(QString::fromLatin1(sql)))
+        throw errorOf(mOnce->lastError());
+    return SqlRows(execute(*mOnce, values));
 }
 
 int SqlConnection::change(const QByteArray& sql, const QVariantList& values)

@@ -9,7 +9,9 @@ SqlDialect sqlite()
 {
     SqlDialect dialect;
     dialect.driver = QStringLiteral("QSQLITE");
+    // [ms]; as long as the server's lock_timeout below.
     dialect.connectOptions = QStringLiteral("QSQLITE_BUSY_TIMEOUT=30000");
+    // Without it the engine passes over what tables refer to.
     dialect.afterOpening << QStringLiteral("PRAGMA foreign_keys = ON");
     // Readers and the writer then do not wait for each other.
     dialect.beforeSchema << QStringLiteral("PRAGMA journal_mode = WAL");
@@ -17,10 +19,16 @@ SqlDialect sqlite()
     // A transaction that began by reading cannot wait for another writer: it would have to be repeated.
     dialect.beginWriting << QStringLiteral("BEGIN IMMEDIATE");
     dialect.hasSchema = QStringLiteral("SELECT COUNT(*) FROM sqlite_master WHERE name = 'schema_version'");
+    // Without the last word the number of a deleted row would be given out again.
     dialect.id = QStringLiteral("INTEGER PRIMARY KEY AUTOINCREMENT");
+    // By this very word a key is the row's own number, and needs no index.
+    dialect.key = QStringLiteral("INTEGER");
     dialect.text = QStringLiteral("TEXT");
     dialect.bytes = QStringLiteral("BLOB");
     dialect.bytesOf = QStringLiteral("CAST(%1 AS BLOB)");
+    dialect.wordsKey = QStringLiteral("rowid");
+    dialect.wordsOf = QStringLiteral("%1 GLOB ?");
+    dialect.hasMatchIndex = true;
     return dialect;
 }
 
@@ -49,9 +57,13 @@ SqlDialect postgres()
         QStringLiteral("SELECT COUNT(*) FROM pg_tables"
                        " WHERE tablename = 'schema_version' AND schemaname = current_schema()");
     dialect.id = QStringLiteral("BIGINT GENERATED ALWAYS AS IDENTITY PRIMARY KEY");
+    dialect.key = QStringLiteral("BIGINT");
+    // In the order of bytes, as with the other engine, whatever language the server was set up for.
     dialect.text = QStringLiteral("TEXT COLLATE \"C\"");
     dialect.bytes = QStringLiteral("BYTEA");
     dialect.bytesOf = QStringLiteral("convert_to(%1, 'UTF8')");
+    dialect.wordsKey = QStringLiteral("study_id");
+    dialect.wordsOf = QStringLiteral("%1 LIKE ?");
     return dialect;
 }
 
@@ -62,6 +74,20 @@ const SqlDialect& SqlDialect::of(DatabaseAddress::Engine engine)
     static const SqlDialect kSqlite = sqlite();
     static const SqlDialect kPostgres = postgres();
     return engine == DatabaseAddress::Engine::Sqlite ? kSqlite : kPostgres;
+}
+
+QByteArray SqlDialect::pattern(const QByteArray& stars) const
+{
+    QByteArray written;
+    for (const char each : stars) {
+        if (hasMatchIndex)
+            written += each == '[' || each == '?' ? QByteArray("[") + each + ']' : QByteArray(1, each);
+        else if (each == '*')
+            written += '%';
+        else
+            written += each == '%' || each == '_' || each == '\\' ? QByteArray("\\") + each : QByteArray(1, each);
+    }
+    return written;
 }
 
 }  // namespace Kxg

@@ -1,3 +1,5 @@
+#include "platform/database/ChangeLog.h"
+#include "platform/database/SearchRows.h"
 #include "platform/database/SqlCatalogue.h"
 #include "platform/database/StudyContent.h"
 #include "platform/database/StudyDescription.h"
@@ -85,6 +87,7 @@ public:
 
     Kdd::Result finish(const BuiltStudy& built) override
     {
+        // A build that left something out keeps the requests, and with them the study's place in the queue.
         return conclude(built.isComplete ? mStudy.requests : QVector<qint64>(), [&] {
             keep(built);
             if (built.settleAt > 0)
@@ -97,11 +100,22 @@ public:
         return conclude({request}, [&] { keep(built); });
     }
 
+    Kdd::Result noteSearch(const BuiltStudy& built) override
+    {
+        return conclude({}, [&] { keepSearch(built); });
+    }
+
     Kdd::Result finishRemoved() override
     {
         return conclude(mStudy.requests, [this] {
+            if (searchRowOf(mConnection, mStudyId).isBuilt)
+                noteChange(mConnection, {ChangeKind::Deleted, mStudy.uid, {}, {}, 0});
+            removeSearchRows(mConnection, mStudyId);
+            putRegisteredRows(mConnection, mStudyId);
+            // Also for a study that stays because it got files meanwhile: it has no tag file now.
             mConnection.change("UPDATE study SET tag_file_size = 0, tag_file_digest = NULL WHERE id = ?",
                                {mStudyId});
+            // Requests that are still there came after those that are done, and speak of files.
             mConnection.change("DELETE FROM study WHERE id = ?"
                                " AND NOT EXISTS (SELECT 1 FROM series WHERE series.study_id = study.id)"
                                " AND NOT EXISTS (SELECT 1 FROM build_request"
@@ -117,6 +131,7 @@ private:
             // A lock that was lost may be another builder's by now, whose work must not be overwritten.
             mLock->confirm();
             mConnection.transact(SqlConnection::Access::Write, [&] {
+                // First, so that the work finds only requests that came since.
                 deleteRequests(mConnection, done);
                 work();
             });
@@ -125,9 +140,38 @@ private:
 
     void keep(const BuiltStudy& built)
     {
+        keepSearch(built);
         mConnection.change("UPDATE study SET tag_file_size = ?, tag_file_digest = ? WHERE id = ?",
                            {built.tagFile.size, bytesValue(built.tagFile.digest), mStudyId});
         describe(built.series);
+    }
+
+    void keepSearch(const BuiltStudy& built)
+    {
+        const SearchRowState row = searchRowOf(mConnection, mStudyId);
+        int instances = 0;
+        for (const SeriesSearchRecord& series : built.search.series)
+            instances += series.instances;
+        // A tag file without images is that of a study that goes on waiting for its first one.
+        if (built.search.series.empty())
+            removeSearchRows(mConnection, mStudyId);
+        else
+            putSearchRows(mConnection, mStudyId, built.search, built.tagFile);
+        // What was shown so far is what the rows were taken from, whatever tag file the study is said to have.
+        const bool isSame = built.movedTo.isEmpty() && row.tagFile.digest == built.tagFile.digest;
+        if (row.isBuilt && (isSame || built.isOnlyRearranged))
+            return;
+        noteChange(mConnection, {kindOf(built, row, instances), mStudy.uid, built.movedFrom, built.movedTo,
+                                 instances});
+    }
+
+    static ChangeKind kindOf(const BuiltStudy& built, const SearchRowState& row, int instances)
+    {
+        if (!built.movedTo.isEmpty())
+            return ChangeKind::Moved;
+        if (!row.isBuilt || instances > row.instances)
+            return ChangeKind::Arrived;
+        return instances < row.instances ? ChangeKind::Deleted : ChangeKind::Corrected;
     }
 
     void describe(const std::vector<DicomFileRecord>& series)
@@ -188,6 +232,7 @@ public:
             mPassed.insert(studyId);
         std::unique_ptr<StudyClaim> claim;
         qint64 last = 0;
+        // By number and not by counting rows, since requests come and go while the queue is walked.
         for (auto page = pageOfQueue(mConnection, last); !claim && !page.empty();
              page = pageOfQueue(mConnection, last)) {
             last = page.back().id;
@@ -201,6 +246,7 @@ private:
     {
         std::unique_ptr<StudyClaim> claim;
         for (auto request = page.begin(); !claim && request != page.end(); ++request) {
+            // A study may have several requests, but it is tried once.
             if (mPassed.contains(request->studyId))
                 continue;
             mPassed.insert(request->studyId);
@@ -239,6 +285,7 @@ std::unique_ptr<StudyClaim> tryClaim(SqlConnection& connection, std::unique_ptr<
         studyId = ifAbsent == Catalogue::IfAbsent::Create ? findStudyId(connection, studyUID)
                                                           : obtainStudyId(connection, studyUID);
     });
+    // Apart from the search, since a study mostly exists and reading waits for nobody.
     if (studyId == 0)
         connection.transact(SqlConnection::Access::Write,
                             [&] { studyId = obtainStudy(connection, studyUID).id; });
@@ -258,6 +305,7 @@ std::unique_ptr<StudyClaim> tryClaim(SqlConnection& connection, std::unique_ptr<
 Kdd::Result SqlCatalogue::requestBuild(const QVector<QByteArray>& studyUIDs, IfGone ifGone)
 {
     return transact(Access::Write, [&] {
+        // An absent study has the id 0, for which no request is left.
         for (const QByteArray& uid : studyUIDs)
             leaveRequest(mConnection, ifGone == IfGone::PassOver ? findStudyId(mConnection, uid)
                                                                  : obtainStudyId(mConnection, uid));
@@ -293,6 +341,8 @@ Kdd::Result SqlCatalogue::claim(const QByteArray& studyUID, int patienceMs,
     return attempt(mConnection.address(), [&] {
         QElapsedTimer waited;
         waited.start();
+        // One for all attempts, as it may be a connection to a server. The study is looked up each time: its
+        // id may change.
         std::unique_ptr<StudyLock> lock = StudyLock::make(mConnection.address());
         while (!(claim = tryClaim(mConnection, lock, studyUID, ifAbsent)) && waited.elapsed() < patienceMs)
             QThread::msleep(kPause);

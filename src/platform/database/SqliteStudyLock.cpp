@@ -36,6 +36,7 @@ public:
 
     void unlock() override { set(F_UNLCK, mHeld); }
 
+    // The system keeps the lock as long as the file is open, so there is nothing to ask.
     void confirm() override {}
 
 private:
@@ -46,6 +47,7 @@ private:
         range.l_whence = SEEK_SET;
         range.l_start = studyId;
         range.l_len = 1;
+        // Not waiting either. Closing any other descriptor of the file does not end this kind of lock.
         while (::fcntl(mFd, F_OFD_SETLK, &range) != 0) {
             if (errno == EAGAIN || errno == EACCES)
                 return false;

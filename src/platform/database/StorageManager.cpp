@@ -34,6 +34,7 @@ QByteArray StorageManager::getMetaFolder()
 
 Kdd::Result StorageManager::retrieveStorageVolumes()
 {
+    // By number, since the bytes of the names would put the tenth before the second.
     QMap<int, QByteArray> volumes;
     Kdd::Result result = askDatabase([&](SqlConnection& connection) {
         SqlRows rows =
@@ -42,6 +43,7 @@ Kdd::Result StorageManager::retrieveStorageVolumes()
             if (const int number = volumeNumber(rows.text(0)); number > 0)
                 volumes.insert(number, rows.bytes(1));
     });
+    // The folders known so far stay when the database cannot be asked.
     if (result.good()) {
         const std::lock_guard<std::mutex> locker(sMutex);
         sVolumes = volumes.values().toVector();

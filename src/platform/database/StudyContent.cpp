@@ -1,5 +1,6 @@
 #include "platform/database/StudyContent.h"
 
+#include "platform/database/SearchRows.h"
 #include "platform/database/SqlConnection.h"
 
 #include <QDateTime>
@@ -17,6 +18,7 @@ KeptNode obtain(SqlConnection& connection, const char* search, const char* make,
         if (found.next())
             return {found.number(0), found.number(1) != 0};
     }
+    // Nobody has made it in between, because writers take turns.
     SqlRows made = connection.ask(make, key);
     return {made.next() ? made.number(0) : 0, false};
 }
@@ -52,6 +54,7 @@ KeptNode obtainSeries(SqlConnection& connection, qint64 studyId, const QByteArra
 
 qint64 leaveRequest(SqlConnection& connection, qint64 studyId, qint64 due)
 {
+    // Selected from the table, so that a study that is gone gets no request.
     SqlRows rows = connection.ask("INSERT INTO build_request (study_id, due)"
                                   " SELECT id, CAST(? AS BIGINT) FROM study WHERE id = ? RETURNING id",
                                   {due, studyId});
@@ -64,6 +67,7 @@ void concludeChange(SqlConnection& connection, qint64 studyId, QMap<QByteArray, 
     connection.change("DELETE FROM series WHERE study_id = ?"
                       " AND NOT EXISTS (SELECT 1 FROM file WHERE file.series_id = series.id)",
                       {studyId});
+    putRegisteredRows(connection, studyId);
     const qint64 request = leaveRequest(connection, studyId);
     SqlRows rows = connection.ask("SELECT uid FROM study WHERE id = ?", {studyId});
     if (rows.next())
@@ -72,12 +76,14 @@ void concludeChange(SqlConnection& connection, qint64 studyId, QMap<QByteArray, 
 
 qint64 takeRegistrationNumbers(SqlConnection& connection, qint64 count)
 {
+    // Counted apart from the files, so that removing the newest file does not bring its number back.
     SqlRows rows = connection.ask("UPDATE registration SET last = last + ? RETURNING last", {count});
     return rows.next() ? rows.number(0) - count + 1 : 0;
 }
 
 void showNewest(SqlConnection& connection, qint64 studyId, const QByteArray& sopUID)
 {
+    // Files may share a number when they were registered before numbers were kept; then the last path counts.
     connection.change("UPDATE file SET is_shown = 1 WHERE path ="
                       " (SELECT newest.path FROM file newest JOIN series ON series.id = newest.series_id"
                       " WHERE series.study_id = ? AND newest.sop_uid = ? AND newest.kind = 1"
@@ -89,6 +95,7 @@ void showNewestOfAll(SqlConnection& connection, qint64 studyId)
 {
     QList<QByteArray> images;
     {
+        // Only an image with a file that is not shown can have one to take the place of another.
         SqlRows rows =
             connection.ask("SELECT DISTINCT file.sop_uid FROM file JOIN series ON series.id = file.series_id"
                            " WHERE series.study_id = ? AND file.kind = 1 AND file.is_shown = 0",

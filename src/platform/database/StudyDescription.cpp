@@ -7,6 +7,7 @@ namespace Kxg
 namespace
 {
 
+/// Column and value in one place, so that a statement and what is bound to it cannot get out of step.
 struct Attribute
 {
     const char* column;
@@ -55,6 +56,7 @@ QVariantList description(const DicomFileRecord& record, const Attribute (&attrib
 
 void describeStudy(SqlConnection& connection, qint64 studyId, const DicomFileRecord& image)
 {
+    // One text for all calls, because statements are prepared once and kept by their texts.
     static const QByteArray kDescribe = describing("study", kStudyAttributes);
     connection.change(kDescribe, description(image, kStudyAttributes, studyId));
 }

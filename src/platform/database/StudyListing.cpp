@@ -24,6 +24,8 @@ std::vector<ListedVolume> listVolumes(SqlConnection& connection, qint64 studyId)
     SqlRows rows = connection.ask("SELECT file.path AS path, series.uid FROM series"
                                   " JOIN file ON file.series_id = series.id"
                                   " WHERE series.study_id = ? AND file.kind = 2"
+                                  // And what corrections brought along: volumes of other series with images
+                                  // that stand here now.
                                   " UNION SELECT volume_share.path AS path, series.uid FROM series"
                                   " JOIN volume_share ON volume_share.series_id = series.id"
                                   " WHERE series.study_id = ? ORDER BY path",
@@ -37,6 +39,7 @@ QVector<QByteArray> pathsOf(const std::vector<ListedVolume>& volumes)
 {
     QVector<QByteArray> paths;
     for (const ListedVolume& volume : volumes) {
+        // A file that several series share is listed for each, in a row, since the order is by path.
         if (paths.isEmpty() || paths.last() != volume.path)
             paths.append(volume.path);
     }

@@ -16,6 +16,7 @@ Result ExFileCache::init(const char* folder)
 {
     const QByteArray name = folder == nullptr ? ExResource::fileCacheFolder() : QByteArray(folder);
     const QString path = QFile::decodeName(name);
+    // Qt would find another folder than the bytes name, or none.
     if (!isPlainText(name))
         return Result::failure(QStringLiteral("The name of the file cache's folder %1 is no text").arg(path));
     if (path.isEmpty())
@@ -28,6 +29,7 @@ Result ExFileCache::init(const char* folder)
 
 QString ExFileCache::pathOf(const QByteArray& name) const
 {
+    // The hash makes a file name of any bytes, and none that leads out of the folder.
     const QByteArray hash = QCryptographicHash::hash(name, QCryptographicHash::Sha256).toHex();
     return mFolder + QLatin1Char('/') + QString::fromLatin1(hash);
 }
@@ -50,6 +52,7 @@ bool ExFileCache::readBuffer(const QByteArray& name, QByteArray& bytes) const
     if (mFolder.isEmpty() || !file.open(QIODevice::ReadOnly))
         return false;
     const QByteArray found = file.readAll();
+    // A shorter answer than the file is a read that failed underway, not an entry.
     if (file.error() != QFileDevice::NoError || found.size() != file.size())
         return false;
     bytes = found;

@@ -25,6 +25,7 @@ int openDescriptor(const QByteArray& path, FileLock lock, IfAbsent ifAbsent)
     const int access = lock == FileLock::Shared ? O_RDONLY : O_RDWR;
     const int creation = ifAbsent == IfAbsent::Create ? O_CREAT : 0;
     int fd = -1;
+    // A signal may interrupt the opening on a slow mount. That says nothing of the file.
     do {
         fd = ::open(path.constData(), access | creation | O_CLOEXEC, 0666);
     } while (fd < 0 && errno == EINTR);
@@ -51,6 +52,7 @@ int checkIdentity(int fd, const QByteArray& path)
     struct stat named = {};
     if (::fstat(fd, &opened) != 0)
         return errno;
+    // A folder can be opened and locked for reading as a file can, so it has to be refused here.
     if (S_ISDIR(opened.st_mode))
         return EISDIR;
     if (::stat(path.constData(), &named) != 0)
@@ -61,6 +63,8 @@ int checkIdentity(int fd, const QByteArray& path)
 
 LockedOpenResult failure(int error)
 {
+    // Both pass with time: somebody holds the file, or it was replaced and the next opening finds its
+    // successor.
     if (error == EWOULDBLOCK || error == ESTALE)
         return {OpenFailure::Locked, error};
     return {error == ENOENT ? OpenFailure::NotFound : OpenFailure::System, error};
@@ -78,6 +82,7 @@ LockedOpenResult tryOnce(const QByteArray& path, FileLock lock, IfAbsent ifAbsen
         error = checkIdentity(fd, path);
     if (error == 0)
         return {};
+    // Closing also gives back a lock that was gained on a file nobody else will find.
     ::close(fd);
     return failure(error);
 }
@@ -109,6 +114,7 @@ LockedOpenResult openLockedFile(QFile& file, const QString& path, FileLock lock,
     const auto mode = lock == FileLock::Shared ? QIODevice::ReadOnly : QIODevice::ReadWrite;
     if (file.open(fd, mode, QFileDevice::AutoCloseHandle))
         return result;
+    // The QFile was open already and has not taken the descriptor.
     ::close(fd);
     return failure(EBUSY);
 }

@@ -14,6 +14,7 @@ bool statusOf(const char* path, FileStatus& status)
         return false;
     constexpr qint64 kNanosecondsPerSecond = 1000000000;
     status.size = found.st_size;
+    // Nanoseconds: a file can be written anew within a second and have the same size.
     status.modified = found.st_mtim.tv_sec * kNanosecondsPerSecond + found.st_mtim.tv_nsec;
     return true;
 }

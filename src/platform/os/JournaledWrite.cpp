@@ -28,6 +28,7 @@ constexpr int kHeaderSize = 20;
 // What a QByteArray can hold, with room for its own bookkeeping.
 constexpr quint64 kMaxContent = std::numeric_limits<int>::max() - 64;
 
+/// Closed with the object, or before by close() where the answer counts.
 class Descriptor
 {
 public:
@@ -75,9 +76,11 @@ int writeAll(int fd, const QByteArray& bytes, off_t at)
 {
     for (int done = 0; done < bytes.size();) {
         const auto left = static_cast<size_t>(bytes.size() - done);
+        // By offset: the position that the QFile above knows of stays as it is.
         const ssize_t written = ::pwrite(fd, bytes.constData() + done, left, at + done);
         if (written < 0 && errno == EINTR)
             continue;
+        // Nothing written and no error either would go on for ever.
         if (written <= 0)
             return written < 0 ? errno : EIO;
         done += static_cast<int>(written);
@@ -92,6 +95,7 @@ int readAll(int fd, QByteArray& bytes, off_t at)
         const ssize_t got = ::pread(fd, bytes.data() + done, left, at + done);
         if (got < 0 && errno == EINTR)
             continue;
+        // The end of the file: it has become shorter since it was asked for its size.
         if (got <= 0)
             return got < 0 ? errno : EIO;
         done += static_cast<int>(got);
@@ -118,8 +122,10 @@ int flushFolderOf(const QString& path)
     return ::fsync(folder.fd()) == 0 || errno == EINVAL ? 0 : errno;
 }
 
+/// Takes the room before the first old byte changes, so that a full disk is a refusal and not a torn file.
 int reserve(int fd, off_t size)
 {
+    // The system refuses to reserve nothing.
     if (size == 0)
         return 0;
     int error = 0;
@@ -179,6 +185,7 @@ int fillJournal(Descriptor& journal, const QByteArray& content, mode_t mode, Flu
         error = writeAll(journal.fd(), content, kHeaderSize);
     if (error == 0 && flush == Flush::Disk)
         error = confirm(journal.fd(), flush);
+    // Closing brings out the write errors that a network file system has kept back.
     return error == 0 ? journal.close() : error;
 }
 
@@ -190,6 +197,8 @@ SystemResult writeJournal(const QString& path, const QByteArray& content, mode_t
     if (journal.fd() < 0)
         return failed("create", name, errno);
     int error = fillJournal(journal, content, mode, flush);
+    // The journal's name must be on the disk as well before the file changes, or nobody would find it after a
+    // loss of power.
     if (error == 0 && flush == Flush::Disk)
         error = flushFolderOf(path);
     if (error == 0)
@@ -211,12 +220,14 @@ JournalContent readJournal(int fd)
     struct stat found = {};
     if (::fstat(fd, &found) != 0)
         return {false, {}, errno};
+    // Its writer died while it began.
     if (found.st_size < kHeaderSize)
         return {};
     QByteArray header(kHeaderSize, Qt::Uninitialized);
     if (const int error = readAll(fd, header, 0))
         return {false, {}, error};
     const auto length = qFromLittleEndian<quint64>(header.constData() + kLengthAt);
+    // The length must be that of the file to the byte before memory is taken for it.
     if (std::memcmp(header.constData(), kMagic, sizeof kMagic) != 0 || length > kMaxContent ||
         length != static_cast<quint64>(found.st_size - kHeaderSize))
         return {};
@@ -251,6 +262,8 @@ QString journalPath(const QString& path)
 bool hasJournal(const QString& path)
 {
     struct stat found = {};
+    // A link counts, also one that leads nowhere: recovery then fails with a reason instead of passing it
+    // over.
     return ::lstat(pathBytes(journalPath(path)).constData(), &found) == 0;
 }
 
@@ -268,6 +281,7 @@ SystemResult writeInPlace(QFile& locked, const QString& path, const QByteArray& 
         result = reserveOrUndo(locked.handle(), path, former.st_size, content.size());
     if (result.bad())
         return result;
+    // From here on the journal stays after any failure: it holds the only whole copy.
     if (const int error = putInPlace(locked.handle(), content, options))
         return failed("write", path, error);
     return removeJournal(path);
@@ -288,6 +302,8 @@ SystemResult recoverInterruptedWrite(QFile& locked, const QString& path, Flush f
         return failed("read", name, content.error);
     if (!content.isComplete)
         return removeJournal(path);
+    // What lies behind a shorter content stays, because the journal does not tell whether its writer wanted
+    // it cut.
     if (const int error = putInPlace(locked.handle(), content.bytes, {flush, Tail::Keep}))
         return failed("write", path, error);
     return removeJournal(path);

@@ -10,6 +10,7 @@ namespace Kdd
 namespace
 {
 
+// Second halves of surrogate pairs, which stand alone in no valid text: the byte XX is the character U+DCXX.
 constexpr ushort kFirstByte = 0xDC80;
 constexpr ushort kLastByte = 0xDCFF;
 constexpr ushort kShift = 0xDC00;
@@ -25,11 +26,13 @@ bool isByte(const QString& text, int i)
 
 bool isPlainText(const QByteArray& bytes)
 {
+    // Tried with the very bytes, so it holds for every encoding that a locale may have.
     return QFile::encodeName(QFile::decodeName(bytes)) == bytes;
 }
 
 QString pathText(const QByteArray& bytes)
 {
+    // Nearly every name: it stays readable, and Qt's own classes find it.
     if (isPlainText(bytes))
         return QFile::decodeName(bytes);
     QString text;
@@ -44,6 +47,8 @@ QByteArray pathBytes(const QString& path)
 {
     QByteArray bytes;
     int from = 0;
+    // Text between such characters goes through the locale's encoding, each of them becomes the byte it
+    // stands for.
     for (int i = 0; i < path.size(); ++i) {
         if (!isByte(path, i))
             continue;

@@ -35,6 +35,7 @@ SystemResult RandomAccessFile::open(const char* path)
         return SystemResult::of(errno);
     if (S_ISDIR(status.st_mode))
         return SystemResult::of(EISDIR);
+    // Devices and pipes have no size to hold claims against.
     if (!S_ISREG(status.st_mode))
         return SystemResult::of(EINVAL);
     mIdentity = identityOf(status);
@@ -43,6 +44,8 @@ SystemResult RandomAccessFile::open(const char* path)
 
 bool RandomAccessFile::isUnchanged() const
 {
+    // The open file is asked and not its name: another file put in its place leaves the bytes read here as
+    // they were.
     struct stat status = {};
     return ::fstat(mDescriptor, &status) == 0 && identityOf(status) == mIdentity;
 }
@@ -51,6 +54,7 @@ qint64 RandomAccessFile::readAt(qint64 offset, void* bytes, qint64 count) const
 {
     qint64 done = 0;
     while (done < count) {
+        // By offset, since any number of threads read over the one descriptor.
         const ssize_t got = ::pread(mDescriptor, static_cast<char*>(bytes) + done,
                                     static_cast<size_t>(count - done), offset + done);
         if (got < 0 && errno == EINTR)

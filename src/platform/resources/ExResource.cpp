@@ -24,6 +24,7 @@ struct Setting
     const char* standard;
 };
 
+// Name in the environment, key in the file, and what counts without either.
 constexpr Setting kWebHost = {"KDD_WEB_HOST", "web/host", "localhost"};
 constexpr Setting kCloudDownload = {"KDD_CLOUD_DOWNLOAD", "cloud/download",
                                     "https://storage-download.googleapis.com/"};
@@ -34,6 +35,8 @@ constexpr Setting kCloudToken = {"KDD_CLOUD_TOKEN", "cloud/token", "https://oaut
 constexpr Setting kDatabase = {"KDD_DATABASE", "database/address", ""};
 constexpr Setting kMetaFolder = {"KDD_META_FOLDER", "folders/meta", ""};
 constexpr Setting kFileCacheFolder = {"KDD_FILE_CACHE", "folders/filecache", ""};
+constexpr Setting kAnswersFolder = {"KDD_ANSWERS", "folders/answers", ""};
+constexpr Setting kAnswersSize = {"KDD_ANSWERS_SIZE", "folders/answerssize", "1024"};
 constexpr Setting kTlsVerify = {"KDD_TLS_VERIFY", "tls/verify", "0"};
 constexpr Setting kTlsCaFile = {"KDD_TLS_CA_FILE", "tls/cafile", ""};
 constexpr Setting kSettleSeconds = {"KDD_SETTLE_SECONDS", "archive/settleseconds", "300"};
@@ -70,6 +73,7 @@ QString filePath()
 Values readFile()
 {
     const QString path = filePath();
+    // Nothing is read then, because Qt would look for a file of another name.
     if (!isPlainText(qgetenv("KDD_CONFIG"))) {
         LogFile::warnf("The settings in %s cannot be read: the name is no text",
                        qgetenv("KDD_CONFIG").constData());
@@ -80,6 +84,7 @@ Values readFile()
     if (!QFileInfo::exists(path) && !isNamed)
         return {};
     QSettings file(path, QSettings::IniFormat);
+    // Qt would take Latin-1 otherwise, whatever the locale is.
     file.setIniCodec("UTF-8");
     Values values;
     const QStringList keys = file.allKeys();
@@ -93,6 +98,7 @@ Values readFile()
 
 QByteArray valueOf(const Setting& setting)
 {
+    // Asked anew each time, while the file is read once.
     QByteArray fromEnvironment = qgetenv(setting.variable);
     if (!fromEnvironment.isEmpty())
         return fromEnvironment;
@@ -103,6 +109,7 @@ QByteArray valueOf(const Setting& setting)
 
 QByteArray endpoint(const Setting& setting)
 {
+    // The bucket's name is put directly behind.
     const QByteArray address = valueOf(setting);
     return address.endsWith('/') ? address : address + '/';
 }
@@ -162,6 +169,16 @@ QByteArray ExResource::fileCacheFolder()
     return valueOf(kFileCacheFolder);
 }
 
+QByteArray ExResource::answersFolder()
+{
+    return valueOf(kAnswersFolder);
+}
+
+int ExResource::answersSize()
+{
+    return numberOf(kAnswersSize, 0, 1024 * 1024);
+}
+
 bool ExResource::verifiesTls()
 {
     return valueOf(kTlsVerify) != "0";
@@ -174,6 +191,7 @@ QByteArray ExResource::tlsCaFile()
 
 int ExResource::readPatience()
 {
+    // Ten minutes [ms].
     return numberOf(kReadPatience, 0, 600000);
 }
 

@@ -44,6 +44,13 @@ public:
     /// Folder of the file cache. KDD_FILE_CACHE, folders/filecache, empty: there is no file cache.
     static QByteArray fileCacheFolder();
 
+    /// Folder of the answers that `kdd serve` keeps ready. KDD_ANSWERS, folders/answers, empty: "answers" in the folder of
+    /// the tag files.
+    static QByteArray answersFolder();
+
+    /// How much of it may stay used [MiB], 0 to 1048576; 0: none is kept. KDD_ANSWERS_SIZE, folders/answerssize, "1024".
+    static int answersSize();
+
     /// Whether servers must prove who they are when they are reached over TLS: not when the value is 0, so that a
     /// misspelt one errs on the safe side. KDD_TLS_VERIFY, tls/verify, "0".
     static bool verifiesTls();

@@ -16,6 +16,7 @@ namespace
 template <typename To>
 To toValue(double mean)
 {
+    // The mean of whole numbers lies among them, so what is rounded fits their type.
     if constexpr (std::is_integral_v<To>)
         return static_cast<To>(std::llround(mean));
     else
@@ -39,6 +40,7 @@ double meanOf(const T* corner, const Block& block, double blank)
         const T* row = corner + y * block.rowStep;
         for (int x = 0; x < block.side; ++x) {
             const auto value = double(row[x * block.pixelStep]);
+            // One value that is no number would spoil the mean of its whole block.
             if (std::is_floating_point_v<T> && !std::isfinite(value))
                 continue;
             sum += value;
@@ -73,6 +75,7 @@ int reductionFactor(const TypedData2D& pixels, int width, int height)
 {
     if (width < 1 || height < 1)
         return 1;
+    // The smaller of the two, so that neither side falls below what is asked for.
     return qMax(1, qMin(pixels.width / width, pixels.height / height));
 }
 
@@ -99,6 +102,7 @@ TypedData2D averageBlocks(const TypedData2D& pixels, int factor, double blank, M
 
 TypedData2D scaleValues(const TypedData2D& pixels, double slope, double intercept)
 {
+    // The values keep their type then, and the copy shares their bytes.
     if (slope == 1 && intercept == 0)
         return pixels;
     TypedData2D scaled = pixels;

@@ -23,12 +23,14 @@ Result noDecoder(const char* syntax)
 
 bool isVideo(E_TransferSyntax xfer)
 {
+    // These syntaxes stand in a row in DCMTK's numbering.
     return xfer >= EXS_MPEG2MainProfileAtMainLevel && xfer <= EXS_HEVCMain10ProfileLevel5_1;
 }
 
 Result checkCodestream(const FrameLayout& layout, qint64 columns, qint64 rows, qint64 samples, int precision)
 {
     const bool isSame = columns == layout.columns && rows == layout.rows && samples == layout.samples;
+    // Single bits may come in a codestream of eight.
     if (isSame && precision >= 1 && precision <= qMax(8, layout.bitsAllocated))
         return Result();
     return Result::failure(
@@ -58,6 +60,7 @@ Result decodeDeflated(const QByteArray& bytes, const FrameLayout& layout, Stored
     const auto status =
         libdeflate_deflate_decompress(inflater.get(), bytes.constData(), static_cast<size_t>(bytes.size()),
                                       frame.data(), static_cast<size_t>(frame.size()), &done);
+    // The byte of padding may be missing, a byte of the frame may not.
     if (status != LIBDEFLATE_SUCCESS || qint64(done) < size)
         return Result::failure(
             QStringLiteral("The compressed pixel data are of no kind that can be decoded"));
@@ -84,6 +87,8 @@ Result decodeFrame(const QByteArray& bytes, E_TransferSyntax xfer, const FrameLa
     if (syntax.isEncapsulated())
         return Result::failure(QStringLiteral("The pixel data are not what their transfer syntax says: ") +
                                QLatin1String(syntax.getXferName()));
+    // Deflated frames bear no mark of their own and DCMTK does not know their syntax, so they are what is
+    // left to try.
     return decodeDeflated(bytes, layout, out);
 }
 

@@ -18,7 +18,9 @@ namespace
 
 using Items = QVector<DcmPixelItem*>;
 
+// The longest of the marks below, the signature of a container.
 constexpr int kMagicBytes = 12;
+// Tag and length before each fragment, which the offsets count as well.
 constexpr int kItemHeaderBytes = 8;
 
 /// All items, the offset table first. The sequence finds items by their number step by step from its ends, so walking
@@ -73,6 +75,7 @@ Items selectByOffset(const Items& fragments, const QVector<quint32>& offsets, in
     const bool isLast = frame + 1 == offsets.size();
     Items selected;
     qint64 offset = 0;
+    // A fragment belongs to the frame in whose stretch it begins.
     for (DcmPixelItem* item : fragments) {
         if (offset >= begin && (isLast || offset < qint64(offsets.at(frame + 1))))
             selected.append(item);
@@ -81,6 +84,7 @@ Items selectByOffset(const Items& fragments, const QVector<quint32>& offsets, in
     return selected;
 }
 
+/// Without offsets: a frame reaches from one fragment that begins a codestream to the next such.
 Items selectByStart(const Items& fragments, int frame, DcmFileCache& file)
 {
     Items selected;
@@ -141,8 +145,10 @@ DcmPixelSequence* findFragments(DcmElement& pixelData, E_TransferSyntax& xfer)
 
 Codestream recognizeCodestream(const QByteArray& bytes)
 {
+    // The start of an image and the first byte of the marker behind it.
     if (bytes.startsWith("\xff\xd8\xff"))
         return Codestream::Jpeg;
+    // A bare codestream, or the signature of its container.
     if (bytes.startsWith("\xff\x4f\xff\x51") || bytes.startsWith(QByteArray("\0\0\0\x0cjP  \r\n\x87\n", 12)))
         return Codestream::Jpeg2000;
     if (bytes.startsWith("\xff\x0a") || bytes.startsWith(QByteArray("\0\0\0\x0cJXL \r\n\x87\n", 12)))
@@ -153,6 +159,7 @@ Codestream recognizeCodestream(const QByteArray& bytes)
 Result readFrameBytes(DcmPixelSequence& sequence, int frame, int frames, QByteArray& bytes)
 {
     const Items items = itemsOf(sequence);
+    // The offset table alone is no picture.
     if (items.size() < 2)
         return Result::failure(QStringLiteral("The compressed pixel data are empty"));
     DcmFileCache file;
@@ -168,6 +175,7 @@ Result readFrameBytes(DcmPixelSequence& sequence, int frame, int frames, QByteAr
 
 FragmentSource::FragmentSource(DcmPixelSequence& sequence)
 {
+    // The stream begins behind the offset table.
     for (DcmPixelItem* item : itemsOf(sequence).mid(1)) {
         mFragments.append({item, mSize, lengthOf(*item)});
         mSize += lengthOf(*item);
@@ -180,9 +188,12 @@ qint64 FragmentSource::read(qint64 offset, char* out, qint64 length)
         return -1;
     if (offset >= mSize)
         return 0;
+    // The last fragment that begins no later. An empty one begins where the next does and is passed over by
+    // that.
     const auto next = std::upper_bound(mFragments.cbegin(), mFragments.cend(), offset,
                                        [](qint64 at, const Fragment& f) { return at < f.offset; });
     const Fragment& fragment = *(next - 1);
+    // Not beyond the fragment: whoever wants more asks again.
     const qint64 count = qMin(length, fragment.offset + fragment.size - offset);
     return readPart(*fragment.item, offset - fragment.offset, out, count, mFile) ? count : -1;
 }

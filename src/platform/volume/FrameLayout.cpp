@@ -36,6 +36,7 @@ Result checkBits(const FrameLayout& layout)
 
 Result checkSize(const FrameLayout& layout)
 {
+    // All factors come from 16-bit numbers, so the product cannot wrap.
     if (layout.rows > 0 && layout.columns > 0 && layout.frameBytes() <= kMaxFrameBytes)
         return Result();
     return Result::failure(QStringLiteral("%1 columns and %2 rows are no size of an image")
@@ -76,6 +77,7 @@ Result readFrameLayout(DcmItem& dataset, FrameLayout& layout)
 {
     layout.rows = numberOf(dataset, DCM_Rows, 0);
     layout.columns = numberOf(dataset, DCM_Columns, 0);
+    // Where it is absent the image is grey.
     layout.samples = numberOf(dataset, DCM_SamplesPerPixel, 1);
     layout.frames = numberOfFrames(dataset);
     // Float images have an element of their own in place of Pixel Data, and it tells the bits.
@@ -85,6 +87,7 @@ Result readFrameLayout(DcmItem& dataset, FrameLayout& layout)
     layout.bitsStored = numberOf(dataset, DCM_BitsStored, layout.bitsAllocated);
     layout.highBit = numberOf(dataset, DCM_HighBit, layout.bitsStored - 1);
     layout.isSigned = numberOf(dataset, DCM_PixelRepresentation, 0) == 1;
+    // Of a single sample the attribute means nothing.
     layout.isPlanar = layout.samples == 3 && numberOf(dataset, DCM_PlanarConfiguration, 0) == 1;
     const auto* whole = dynamic_cast<DcmDataset*>(&dataset);
     layout.isBigEndian = whole && whole->getOriginalXfer() == EXS_BigEndianExplicit;
@@ -98,6 +101,7 @@ Result readFrameLayout(DcmItem& dataset, FrameLayout& layout)
 int numberOfFrames(DcmItem& dataset)
 {
     Sint32 frames = 0;
+    // One that is absent or not positive: there is a frame wherever there are pixels.
     return dataset.findAndGetSint32(DCM_NumberOfFrames, frames).good() && frames > 0 ? frames : 1;
 }
 

@@ -12,6 +12,7 @@ namespace Kdd
 namespace
 {
 
+// Read at most of a value whose representation was lost; the texts that are asked for are short.
 constexpr int kMaxTextBytes = 1024;
 
 }  // namespace
@@ -39,6 +40,7 @@ DcmItem* ImageAttributes::findInGroup(const DcmTagKey& groups, int item, const D
     DcmItem* found = nullptr;
     const bool isThere = mDataset.findAndGetSequenceItem(groups, frame, item).good() && frame &&
                          frame->findAndGetSequenceItem(group, found, 0).good() && found;
+    // An empty attribute does not hide one that stands further out.
     return isThere && found->tagExistsWithValue(key) ? found : nullptr;
 }
 
@@ -59,6 +61,7 @@ QVector<double> ImageAttributes::numbers(const DcmTagKey& group, const DcmTagKey
 
 double believableAspect(double width, double height)
 {
+    // Pixels that are longer than that are a mistake of the writer's, and the preview would be a line.
     constexpr double kMost = 20;
     const double aspect = width / height;
     return aspect >= 1 / kMost && aspect <= kMost ? aspect : 1;
@@ -84,6 +87,7 @@ ValueRange windowOf(const ImageAttributes& attributes)
     const QByteArray function = shaped ? textOf(*shaped, DCM_VOILUTFunction) : QByteArray();
     // The linear function spreads a width less 1; the other functions take any width above 0.
     const bool isLinear = function.isEmpty() || function == "LINEAR";
+    // Of centres and widths there should be as many; what has no partner is passed over.
     for (int i = 0; i < qMin(centers.size(), widths.size()); ++i) {
         if (isLinear ? widths.at(i) >= 1 : widths.at(i) > 0)
             return windowRange(centers.at(i), widths.at(i));

@@ -27,6 +27,7 @@ OPJ_SIZE_T readBytes(void* to, OPJ_SIZE_T size, void* user)
 {
     auto* reader = static_cast<Reader*>(user);
     const qint64 left = reader->bytes.size() - reader->position;
+    // The library's sign for the end.
     if (left <= 0)
         return static_cast<OPJ_SIZE_T>(-1);
     const auto count = static_cast<size_t>(qMin<quint64>(quint64(left), size));
@@ -100,6 +101,7 @@ private:
     bool mHasTransform = false;
 };
 
+// A bare codestream begins with a marker, its container with the length of a box.
 Jpeg2000Decoder::Jpeg2000Decoder(const QByteArray& bytes)
     : mReader{bytes}
     , mStream(opj_stream_default_create(OPJ_TRUE), &opj_stream_destroy)
@@ -163,6 +165,7 @@ int Jpeg2000Decoder::reductionFor(int least) const
 {
     if (least <= 0)
         return 0;
+    // The shorter side decides, and the codestream has only so many resolutions.
     const quint32 side = qMin(mImage->x1 - mImage->x0, mImage->y1 - mImage->y0);
     quint32 reduction = 0;
     while (reduction + 1 < mResolutions && (side >> (reduction + 1)) >= quint32(least))
@@ -178,6 +181,7 @@ Result Jpeg2000Decoder::decode(int reduction)
         opj_end_decompress(mCodec.get(), mStream.get()) != OPJ_FALSE;
     if (!isDecoded)
         return failed();
+    // Held against what copySamples relies on, although the decoder reports success.
     for (OPJ_UINT32 i = 0; i < mImage->numcomps; ++i) {
         const opj_image_comp_t& sample = mImage->comps[i];
         if (!sample.data || sample.w < 1 || sample.h < 1)
@@ -194,6 +198,7 @@ void copySamples(const opj_image_t& image, TypedData2D& pixels)
     for (int i = 0; i < pixels.components; ++i) {
         const opj_image_comp_t& sample = image.comps[i];
         for (int y = 0; y < pixels.height; ++y) {
+            // Where the size is no multiple of the step, the last coarse sample serves the pixels left over.
             const OPJ_UINT32 row = qMin(OPJ_UINT32(y) / sample.dy, sample.h - 1);
             const OPJ_INT32* from = sample.data + size_t(row) * sample.w;
             T* line = to + qint64(y) * pixels.width * pixels.components + i;
@@ -204,6 +209,7 @@ void copySamples(const opj_image_t& image, TypedData2D& pixels)
     }
 }
 
+/// Rounded up, as each resolution of a codestream is.
 int halved(int size, int times)
 {
     return static_cast<int>((qint64(size) + (qint64(1) << times) - 1) >> times);
@@ -211,6 +217,7 @@ int halved(int size, int times)
 
 StoredFrame::Colour colourOf(const Jpeg2000Decoder& decoder, const FrameLayout& layout)
 {
+    // With its own transform undone the codestream gives RGB, whatever the dataset says.
     const bool isYbr =
         !decoder.hasTransform() && (decoder.isYbr() || layout.photometric.startsWith("YBR_FULL"));
     return isYbr ? StoredFrame::Colour::YbrFull : StoredFrame::Colour::Rgb;
@@ -238,6 +245,7 @@ Result decodeJpeg2000(const QByteArray& bytes, const FrameLayout& layout, int le
     allocatePixels(out.pixels);
     visitPixelType(out.pixels.type,
                    [&](auto zero) { copySamples<decltype(zero)>(decoder.image(), out.pixels); });
+    // The codestream may have fewer bits than the dataset tells; the sign is then the top one of those.
     const int bits = qMin(int(decoder.image().comps[0].prec), layout.bitsStored);
     keepStoredBits(out.pixels, bits, bits - 1);
     return Result();

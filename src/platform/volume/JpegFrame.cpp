@@ -38,6 +38,8 @@ struct JpegHeader
 /// A transfer syntax whose decoder takes frames of this kind.
 E_TransferSyntax syntaxOfFrame(int marker)
 {
+    // Baseline, extended, progressive, lossless and JPEG-LS. Nothing here decodes the others, such as
+    // arithmetic coding.
     switch (marker) {
     case 0xc0:
         return EXS_JPEGProcess1;
@@ -56,6 +58,7 @@ E_TransferSyntax syntaxOfFrame(int marker)
 
 bool isFrameMarker(int marker)
 {
+    // Huffman tables, a reserved number and arithmetic conditioning have their numbers among those of frames.
     const bool isOther = marker == 0xc4 || marker == 0xc8 || marker == 0xcc;
     return marker == 0xf7 || (marker >= 0xc0 && marker <= 0xcf && !isOther);
 }
@@ -69,6 +72,7 @@ void readFrameHeader(int marker, const QByteArray& segment, JpegHeader& header)
     header.rows = qFromBigEndian<quint16>(segment.constData() + 1);
     header.columns = qFromBigEndian<quint16>(segment.constData() + 3);
     header.samples = quint8(segment.at(5));
+    // Three bytes for each sample, the first of which is its name.
     for (int at = 6; at < segment.size(); at += 3)
         header.sampleNames.append(segment.at(at));
     header.xfer = syntaxOfFrame(marker);
@@ -82,6 +86,7 @@ JpegHeader readHeader(const QByteArray& bytes)
         if (quint8(bytes.at(at)) != 0xff)
             break;
         const int marker = quint8(bytes.at(at + 1));
+        // Any number of fill bytes may stand before a marker.
         if (marker == 0xff) {
             ++at;
             continue;
@@ -90,12 +95,14 @@ JpegHeader readHeader(const QByteArray& bytes)
         const QByteArray segment = bytes.mid(at + 4, qMax(0, length - 2));
         if (marker == 0xe0 && segment.startsWith("JFIF"))
             header.isJfif = true;
+        // The transform is the last of the segment's twelve bytes.
         if (marker == 0xee && segment.startsWith("Adobe") && segment.size() >= 12)
             header.adobeTransform = quint8(segment.at(11));
         if (isFrameMarker(marker)) {
             readFrameHeader(marker, segment, header);
             break;
         }
+        // At least past the length field, so that a damaged length cannot hold the walk in place.
         at += 2 + qMax(2, length);
     }
     return header;
@@ -110,6 +117,7 @@ StoredFrame::Colour colourOf(const JpegHeader& header, const FrameLayout& layout
         return header.adobeTransform == 0 ? Colour::Rgb : Colour::YbrFull;
     if (header.sampleNames == "RGB")
         return Colour::Rgb;
+    // JFIF knows no other colours than luminance and chroma.
     return header.isJfif || layout.photometric.startsWith("YBR") ? Colour::YbrFull : Colour::Rgb;
 }
 
@@ -151,11 +159,13 @@ void describe(const JpegHeader& header, int bits, DcmItem& item)
 std::unique_ptr<DcmPixelSequence> sequenceOf(const QByteArray& bytes)
 {
     auto sequence = std::make_unique<DcmPixelSequence>(DcmTag(DCM_PixelData, EVR_OB));
+    // Fragments have even lengths.
     QByteArray even = bytes;
     even.append(bytes.size() % 2, 0);
     auto* fragment = new DcmPixelItem(DcmTag(DCM_Item, EVR_OB));
     fragment->putUint8Array(reinterpret_cast<const Uint8*>(even.constData()),
                             static_cast<Uint32>(even.size()));
+    // An empty offset table, with which every sequence begins.
     sequence->insert(new DcmPixelItem(DcmTag(DCM_Item, EVR_OB)));
     sequence->insert(fragment);
     return sequence;
@@ -168,6 +178,7 @@ OFCondition decode(const QByteArray& bytes, const JpegHeader& header, TypedData2
     describe(header, 8 * sizeOf(pixels.type), item);
     const auto sequence = sequenceOf(bytes);
     const auto size = static_cast<int>(pixels.rowStride() * pixels.height);
+    // The decoder asks for room of an even number of bytes.
     pixels.pixels = QByteArray(size + size % 2, 0);
     Uint32 fragment = 1;
     OFString colour;
@@ -213,6 +224,7 @@ Result decodeJpeg(const QByteArray& bytes, const FrameLayout& layout, StoredFram
         out.colour = colourOf(header, layout);
     if (out.pixels.pixels.size() < layout.frameBytes())
         widen(out.pixels, layout);
+    // The codec was told of unsigned pixels; the sign is what the dataset says.
     out.pixels.type = layout.type();
     const int bits = qMin(header.precision, layout.bitsStored);
     keepStoredBits(out.pixels, bits, bits - 1);

@@ -69,6 +69,7 @@ QString ownFolder()
 
 QStringList moduleFolders()
 {
+    // Who says where the module is gets it from nowhere else.
     if (qEnvironmentVariableIsSet("KDD_MODULE_FOLDER"))
         return {QFile::decodeName(qgetenv("KDD_MODULE_FOLDER"))};
     const QString own = ownFolder();
@@ -104,6 +105,7 @@ VideoModule findModule()
     const QStringList folders = moduleFolders();
     for (const QString& folder : folders) {
         const QString path = QDir(folder).absoluteFilePath(QLatin1String(kVideoModuleFile));
+        // The first one found counts. When it cannot be loaded its reason is told and no other is tried.
         if (QFileInfo::exists(path))
             return openModule(path);
     }
@@ -144,6 +146,7 @@ unsigned char* allocateFrame(void* target, std::int32_t width, std::int32_t heig
 Result KxCompressedDataMedia::decodeRepresentativeFrame(MediaSource& source, int width, int height,
                                                         double fraction, TypedData2D& frame)
 {
+    // Looked for once: what is missing then is missing for the life of the process.
     static const VideoModule module = findModule();
     if (module.entry == nullptr)
         return Result::failure(module.reason);

@@ -32,6 +32,7 @@ Info infoOf(const ShownPixels& shown, double aspect, bool isInverted)
 QVector<int> candidates(int frames)
 {
     QVector<int> numbers;
+    // Six twelfths are the middle, four and eight the ends of the middle third.
     for (const int twelfth : {6, 5, 7, 4, 8}) {
         const auto number = static_cast<int>(qint64(frames) * twelfth / 12);
         if (number < frames && !numbers.contains(number))
@@ -42,6 +43,7 @@ QVector<int> candidates(int frames)
 
 bool isBlank(const TypedData2D& pixels)
 {
+    // One value throughout shows nothing, whatever it is.
     const ValueRange range = rangeOf(pixels);
     return !(range.lowest < range.highest);
 }
@@ -54,6 +56,7 @@ Result readRepresentative(DcmDataset& dataset, int least, int& number, StoredFra
     for (const int candidate : candidates(numberOfFrames(dataset))) {
         StoredFrame read;
         const Result reading = readStoredFrame(dataset, candidate, least, read);
+        // The first reason is told: the frames after it mostly fail for the same one.
         if (reading.bad() && result.good())
             result = reading;
         const bool showsMore = reading.good() && (!isFound || !isBlank(read.pixels));
@@ -62,30 +65,35 @@ Result readRepresentative(DcmDataset& dataset, int least, int& number, StoredFra
             frame = read;
             isFound = true;
         }
+        // No more is decoded than it takes.
         if (isFound && !isBlank(frame.pixels))
             break;
     }
     return isFound ? Result() : result;
 }
 
+/// Either says so; with both it is said twice and not undone.
 bool isInverted(DcmDataset& dataset)
 {
     return textOf(dataset, DCM_PhotometricInterpretation) == "MONOCHROME1" ||
            textOf(dataset, DCM_PresentationLUTShape) == "INVERSE";
 }
 
-Info showFrame(DcmDataset& dataset, int width, int height, Result& result)
+Info showFrame(DcmDataset& dataset, const FrameView& asked, Result& result)
 {
-    int number = 0;
+    FrameView view = asked;
     StoredFrame frame;
-    result = readRepresentative(dataset, qMax(width, height), number, frame);
+    // By the larger of the two, since a codec halves both sides at once and neither may fall below.
+    const int least = qMax(view.width, view.height);
+    result = view.frame == FrameView::kRepresentative ? readRepresentative(dataset, least, view.frame, frame)
+                                                      : readStoredFrame(dataset, view.frame, least, frame);
     if (result.bad())
         return nullptr;
-    const double aspect = pixelAspect(ImageAttributes(dataset, number));
+    const double aspect = pixelAspect(ImageAttributes(dataset, view.frame));
     if (frame.colour == StoredFrame::Colour::Grey)
-        return infoOf(showGrey(dataset, number, frame, width, height), aspect, isInverted(dataset));
+        return infoOf(showGrey(dataset, view, frame), aspect, isInverted(dataset));
     ShownPixels shown;
-    result = showColour(dataset, frame, width, height, shown);
+    result = showColour(dataset, frame, view.width, view.height, shown);
     return result.good() ? infoOf(shown, aspect, false) : nullptr;
 }
 
@@ -104,6 +112,7 @@ DcmPixelSequence* findVideo(DcmDataset& dataset)
     E_TransferSyntax xfer = EXS_Unknown;
     DcmPixelSequence* fragments =
         dataset.findAndGetElement(DCM_PixelData, pixels).good() ? findFragments(*pixels, xfer) : nullptr;
+    // Its fragments are one stream, of which no frame can be read alone.
     return isVideo(xfer) ? fragments : nullptr;
 }
 
@@ -116,8 +125,23 @@ Info KxVolumeInfo::readVolumeInfo(DcmDataset* dataset, int width, int height, co
         result = Result::failure(QStringLiteral("There is no dataset")).within(path);
         return nullptr;
     }
-    DcmPixelSequence* video = findVideo(*dataset);
-    Info info = video ? showVideo(*video, width, height, result) : showFrame(*dataset, width, height, result);
+    FrameView view;
+    view.width = width;
+    view.height = height;
+    return readVolumeInfo(*dataset, view, path, result);
+}
+
+Info KxVolumeInfo::readVolumeInfo(DcmDataset& dataset, const FrameView& view, const QString& path,
+                                  Result& result)
+{
+    DcmPixelSequence* video = findVideo(dataset);
+    Info info;
+    if (video == nullptr)
+        info = showFrame(dataset, view, result);
+    else if (view.frame == FrameView::kRepresentative)
+        info = showVideo(*video, view.width, view.height, result);
+    else
+        result = Result::failure(QStringLiteral("A frame of a video does not stand alone"));
     result = result.within(path);
     return info;
 }

@@ -25,6 +25,7 @@ bool isShowable(const TypedData2D& pixels)
 ValueRange paddingOf(const ParamBundle& parameters)
 {
     const auto range = parameters.numbers("PaddingRangeMin") + parameters.numbers("PaddingRangeMax");
+    // Both limits or none, and they take the place of the single value.
     if (range.size() == 2)
         return {range.at(0), range.at(1)};
     const auto value = parameters.numbers("PaddingValue");
@@ -39,6 +40,7 @@ ValueRange rangeFor(const ParamBundle& parameters, const TypedData2D& pixels)
     if (center.isEmpty() || width.isEmpty() || !(width.first() > 0))
         return values;
     const ValueRange window = windowRange(center.first(), width.first());
+    // A window that shows none of the values was made for others.
     return window.overlaps(values) ? window : values;
 }
 

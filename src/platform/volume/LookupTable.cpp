@@ -15,6 +15,7 @@ namespace Kdd
 namespace
 {
 
+// Told as 0, since the descriptor's sixteen bits do not reach it.
 constexpr int kMaxEntries = 65536;
 
 /// A value of any of the representations that tables come in, in the machine's order; empty when it is absent. Read
@@ -24,6 +25,7 @@ QByteArray bytesOf(DcmItem& item, const DcmTagKey& key)
     DcmElement* element = nullptr;
     if (item.findAndGetElement(key, element).bad() || element->isLeaf() == OFFalse)
         return {};
+    // No more than the longest table has.
     const Uint32 length = qMin<Uint32>(element->getLengthField(), 2 * kMaxEntries);
     QByteArray bytes(static_cast<int>(length), Qt::Uninitialized);
     return length > 0 && element->getPartialValue(bytes.data(), 0, length).good() ? bytes : QByteArray();
@@ -70,6 +72,8 @@ TypedData2D LookupTable::appliedTo(const TypedData2D& pixels, double factor, dou
         const auto* values = valuesOf<decltype(zero)>(pixels);
         std::transform(values, values + numValues(pixels), valuesOf<quint16>(mapped), [&](auto value) {
             const double looked = factor * double(value) + offset;
+            // Bounded while it is a real number, because a whole one may not hold it. What is no number gets
+            // the first entry.
             return std::isnan(looked) ? at(first) : at(std::llround(qBound(double(first), looked, last)));
         });
     });

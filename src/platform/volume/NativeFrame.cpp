@@ -24,6 +24,7 @@ void unpackBits(const QByteArray& bytes, int firstBit, TypedData2D& pixels)
     const qint64 count = numValues(pixels);
     for (qint64 i = 0; i < count; ++i) {
         const qint64 bit = firstBit + i;
+        // The first pixel is the lowest bit.
         to[i] = (from[bit / 8] >> (bit % 8)) & 1U;
     }
 }
@@ -63,12 +64,6 @@ bool mayShareChroma(const FrameLayout& layout)
     return is422 && layout.samples == 3 && !layout.isPlanar && !layout.isFloat && layout.columns % 2 == 0;
 }
 
-/// Some writers declare shared chroma but store all of it; the length tells.
-bool sharesChroma(const FrameLayout& layout, qint64 length)
-{
-    return mayShareChroma(layout) && length * 8 / nativeFrameBits(layout, false) < layout.frames;
-}
-
 /// Wide pixels come as words: the order within a word is the machine's by now, that of the words is still the file's.
 void swapWords(QByteArray& bytes)
 {
@@ -80,8 +75,14 @@ void swapWords(QByteArray& bytes)
 
 qint64 nativeFrameBits(const FrameLayout& layout, bool sharesChroma)
 {
+    // Two pixels take four values in place of six.
     const qint64 values = sharesChroma ? layout.numValues() / 3 * 2 : layout.numValues();
     return values * layout.bitsAllocated;
+}
+
+bool sharesChroma(const FrameLayout& layout, qint64 length)
+{
+    return mayShareChroma(layout) && length * 8 / nativeFrameBits(layout, false) < layout.frames;
 }
 
 TypedData2D unpackFrame(const QByteArray& bytes, const FrameLayout& layout, int firstBit, bool sharesChroma)
@@ -136,6 +137,7 @@ Result readNativeFrame(DcmElement& pixelData, const FrameLayout& layout, int fra
         return Result::failure(QStringLiteral("Pixel data of %1 bytes end before frame %2 does")
                                    .arg(length)
                                    .arg(qint64(frame) + 1));
+    // Frames of single bits follow each other without padding, so one may begin within a byte.
     const qint64 first = bits * frame / 8;
     const qint64 last = (bits * (qint64(frame) + 1) + 7) / 8;
 

@@ -13,6 +13,7 @@ namespace Kdd
 namespace
 {
 
+// The number of segments and places for fifteen offsets, 32 bits each.
 constexpr int kHeaderBytes = 64;
 constexpr int kMaxSegments = 15;
 
@@ -65,6 +66,7 @@ Result decodeRle(const QByteArray& bytes, const FrameLayout& layout, StoredFrame
     const int width = qMax(1, layout.bitsAllocated / 8);
     const int step = width * layout.samples;
     const QVector<qint64> bounds = readSegments(bytes);
+    // The number of segments is told by the header and by the dataset, which must agree.
     if (bounds.size() != step + 1)
         return damaged(QStringLiteral("segments do not match %1 bytes per pixel").arg(step));
 
@@ -73,10 +75,12 @@ Result decodeRle(const QByteArray& bytes, const FrameLayout& layout, StoredFrame
     for (int i = 0; i < step; ++i) {
         const auto from = static_cast<int>(bounds.at(i));
         const QByteArray segment = bytes.mid(from, static_cast<int>(bounds.at(i + 1)) - from);
+        // Within a sample the highest byte comes first and belongs last.
         const int at = i / width * width + width - 1 - i % width;
         if (!expandSegment(segment, at, step, frame))
             return damaged(QStringLiteral("segment %1 is too short").arg(i + 1));
     }
+    // Each segment was put in its place, so the samples stand side by side, however the dataset calls them.
     FrameLayout sideBySide = layout;
     sideBySide.isPlanar = false;
     out.pixels = unpackFrame(frame, sideBySide, 0, false);

@@ -32,6 +32,7 @@ Result readPalette(DcmItem& dataset, Palette& palette)
         {DCM_GreenPaletteColorLookupTableDescriptor, DCM_GreenPaletteColorLookupTableData},
         {DCM_BluePaletteColorLookupTableDescriptor, DCM_BluePaletteColorLookupTableData}};
     Uint16 representation = 0;
+    // The first number of a table is signed when the pixels are.
     dataset.findAndGetUint16(DCM_PixelRepresentation, representation);
     for (size_t i = 0; i < palette.size(); ++i) {
         Result result = readLookupTable(dataset, channels[i].descriptor, channels[i].data,
@@ -53,6 +54,7 @@ double mostOf(const Palette& palette)
 
 TypedData2D applyPalette(const TypedData2D& numbers, const Palette& palette)
 {
+    // Eight bits are shown, of sixteen the upper ones.
     const int shift = mostOf(palette) > 255 ? 8 : 0;
     TypedData2D colours{numbers.width, numbers.height, 3, PrimitiveType::UInt8, {}};
     allocatePixels(colours);
@@ -110,10 +112,12 @@ Result showColour(DcmItem& dataset, const StoredFrame& stored, int width, int he
         Result read = readPalette(dataset, palette);
         if (read.bad())
             return read;
+        // The palette first, because numbers of colours cannot be averaged.
         shown = reduce({applyPalette(stored.pixels, palette), {0, 255}}, width, height);
         return Result();
     }
     const double most = brightest(dataset, stored.pixels);
+    // Reduced first, so that only the small picture is converted.
     shown = reduce({stored.pixels, {0, most}}, width, height);
     if (stored.colour == StoredFrame::Colour::YbrFull)
         convertYbrToRgb(shown.pixels, most);

@@ -27,6 +27,7 @@ ShownPixels reduce(const ShownPixels& shown, int width, int height)
 ShownPixels spreadNarrowRange(const ShownPixels& shown)
 {
     constexpr double kWide = 65535;
+    // There is no finite value at all, so any range will do.
     if (shown.range.isEmpty())
         return {shown.pixels, {0, 0}};
     const double width = shown.range.highest - shown.range.lowest;

@@ -16,6 +16,7 @@ namespace
 
 DcmElement* findPixels(DcmItem& dataset)
 {
+    // An image has one of the three.
     for (const DcmTagKey& key : {DCM_PixelData, DCM_FloatPixelData, DCM_DoubleFloatPixelData}) {
         DcmElement* element = nullptr;
         if (dataset.findAndGetElement(key, element).good())
@@ -36,6 +37,7 @@ StoredFrame::Colour colourOf(const FrameLayout& layout)
 Result readCompressedFrame(DcmPixelSequence& fragments, E_TransferSyntax xfer, const FrameLayout& layout,
                            int frame, int least, StoredFrame& out)
 {
+    // A frame of a video depends on those before it, so it is found by playing and not by number.
     if (isVideo(xfer))
         return Result::failure(QStringLiteral("A video has no stored frames: ") +
                                QLatin1String(DcmXfer(xfer).getXferName()));
@@ -59,6 +61,7 @@ Result readStoredFrame(DcmItem& dataset, int frame, int least, StoredFrame& out)
         return Result::failure(
             QStringLiteral("There is no frame %1 among %2").arg(qint64(frame) + 1).arg(layout.frames));
 
+    // Filled aside: on failure the caller's frame stays as it was.
     StoredFrame read;
     read.colour = colourOf(layout);
     // Numbers of colours cannot be averaged, so a codec must not do it either.

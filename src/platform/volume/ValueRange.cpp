@@ -15,6 +15,7 @@ namespace
 template <typename T>
 ValueRange rangeWithout(const TypedData2D& pixels, const ValueRange& padding)
 {
+    // The wrong way round, so that without any value the range is empty.
     T lowest = std::numeric_limits<T>::max();
     T highest = std::numeric_limits<T>::lowest();
     const T* value = valuesOf<T>(pixels);
@@ -33,6 +34,7 @@ ValueRange ValueRange::scaled(double slope, double intercept) const
 {
     if (isEmpty())
         return *this;
+    // A negative slope changes places.
     const auto [least, most] = std::minmax({slope * lowest + intercept, slope * highest + intercept});
     return {least, most};
 }

@@ -53,6 +53,7 @@ QByteArray unshuffled(const QByteArray& planes, int elementSize)
 
 QByteArray deflated(const QByteArray& content)
 {
+    // One for each call, because they must not be shared between threads.
     const std::unique_ptr<libdeflate_compressor, Free> compressor(libdeflate_alloc_compressor(kLevel));
     if (!compressor)
         return {};
@@ -77,6 +78,7 @@ QByteArray inflated(const QByteArray& stream, int size)
     const std::unique_ptr<libdeflate_decompressor, Free> decompressor(libdeflate_alloc_decompressor());
     if (!decompressor)
         return {};
+    // Without a place for the actual size, a content of fewer bytes is an error as well.
     QByteArray content(size, Qt::Uninitialized);
     const libdeflate_result result = libdeflate_zlib_decompress(
         decompressor.get(), stream.constData(), static_cast<std::size_t>(stream.size()), content.data(),

@@ -22,6 +22,7 @@ qint64 elementCount(const QVector<hsize_t>& dims, qint64 limit)
 {
     qint64 count = 1;
     for (const hsize_t dim : dims) {
+        // Divided before it is multiplied, so that no product of claimed dimensions wraps.
         if (dim == 0 || dim > static_cast<hsize_t>(limit / count))
             return 0;
         count *= static_cast<qint64>(dim);
@@ -50,7 +51,10 @@ Result ChunkedData::readType()
 {
     mType = Handle(H5Dget_type(mDataset.id()), H5Tclose);
     const H5T_class_t kind = H5Tget_class(mType.id());
+    // A variable-length text is kept in another place of the file, without a checksum.
     const bool isFixedText = kind == H5T_STRING && H5Tis_variable_str(mType.id()) == 0;
+    // No element of ours is longer than a real of eight bytes; a text of a dataset has one character for each
+    // element.
     const std::size_t size = H5Tget_size(mType.id());
     if ((kind != H5T_INTEGER && kind != H5T_FLOAT && !isFixedText) || size < 1 || size > sizeof(double))
         return Result::failure(QStringLiteral("has elements that are neither numbers nor characters"));
@@ -65,6 +69,8 @@ Result ChunkedData::readLayout()
         return libraryFailure(QStringLiteral("cannot examine how it is stored"));
     if (H5Pget_layout(properties.id()) != H5D_CHUNKED)
         return Result::failure(QStringLiteral("is not stored in chunks"));
+    // A dataset of more dimensions than there is room for tells its rank all the same and fills what is
+    // there.
     std::array<hsize_t, kMaxRank> chunk{};
     const int rank = H5Pget_chunk(properties.id(), kMaxRank, chunk.data());
     if (rank < 1 || rank > kMaxRank)
@@ -77,6 +83,7 @@ Result ChunkedData::readLayout()
 
 bool ChunkedData::setChunkBytes()
 {
+    // elementCount is 0 for what is too large, so the check below catches both.
     mChunkBytes = static_cast<int>(elementCount(mChunk, kMaxChunkBytes / mElementSize)) * mElementSize;
     return mChunkBytes > 0;
 }
@@ -88,9 +95,11 @@ Result ChunkedData::readFilters(hid_t properties)
     for (int i = 0; i < count; ++i) {
         unsigned flags = 0;
         unsigned parameter = 0;
+        // No filter that is taken has more than one parameter.
         std::size_t numParameters = 1;
         const H5Z_filter_t filter = H5Pget_filter2(properties, static_cast<unsigned>(i), &flags,
                                                    &numParameters, &parameter, 0, nullptr, nullptr);
+        // The shuffle must run with our own element size, for decode() undoes it with that one.
         const bool isShuffle = mIsShuffled && i == 0 && filter == H5Z_FILTER_SHUFFLE && numParameters == 1 &&
                                parameter == static_cast<unsigned>(mElementSize);
         const bool isDeflate = i == count - 1 && filter == H5Z_FILTER_DEFLATE;
@@ -120,6 +129,7 @@ Result ChunkedData::create(hid_t group, const QByteArray& name, hid_t type, cons
     mChunk = chunk;
     mType = Handle(H5Tcopy(type), H5Tclose);
     mElementSize = static_cast<int>(H5Tget_size(type));
+    // Bytes that are elements already have no planes to be sorted into.
     mIsShuffled = mElementSize > 1;
     if (!setChunkBytes())
         return Result::failure(QStringLiteral("has chunks of more than %1 bytes").arg(kMaxChunkBytes));
@@ -144,6 +154,7 @@ Result ChunkedData::readChunk(const QVector<hsize_t>& start, QByteArray& bytes) 
     if (plausible.bad())
         return plausible;
     QByteArray stored(static_cast<int>(size), Qt::Uninitialized);
+    // The chunk is read as it is stored; its filters are undone here and not inside the library.
     unsigned skippedFilters = 0;
     if (H5Dread_chunk(mDataset.id(), H5P_DEFAULT, start.constData(), &skippedFilters, stored.data()) < 0)
         return libraryFailure(QStringLiteral("cannot be read"));
@@ -154,6 +165,7 @@ Result ChunkedData::checkStored(hsize_t stored) const
 {
     if (stored == 0)
         return Result::failure(QStringLiteral("is not in the file"));
+    // A length that cannot be is refused before memory is taken for it.
     const Handle file(H5Iget_file_id(mDataset.id()), H5Fclose);
     hsize_t fileSize = 0;
     if (H5Fget_filesize(file.id(), &fileSize) < 0)
@@ -164,12 +176,14 @@ Result ChunkedData::checkStored(hsize_t stored) const
     return {};
 }
 
+/// Undoes the filters in the reverse order of writing: first the compression, then the shuffling.
 Result ChunkedData::decode(const QByteArray& stored, unsigned skippedFilters, QByteArray& bytes) const
 {
     // Other writers store a chunk as it is when a filter gains nothing, and mark the filter by its place.
     const unsigned deflate = mIsShuffled ? 2 : 1;
     const bool isShuffled = mIsShuffled && (skippedFilters & 1U) == 0;
     const QByteArray content = (skippedFilters & deflate) != 0 ? stored : inflated(stored, mChunkBytes);
+    // What was stored uncompressed has not been held against its exact size yet.
     if (content.size() != mChunkBytes)
         return Result::failure(QStringLiteral("is damaged"));
     bytes = isShuffled ? unshuffled(content, mElementSize) : content;
@@ -184,6 +198,7 @@ Result ChunkedData::writeChunk(const QVector<hsize_t>& start, const QByteArray& 
     const QByteArray stored = deflated(mIsShuffled ? shuffled(bytes, mElementSize) : bytes);
     if (stored.isEmpty())
         return Result::failure(QStringLiteral("cannot be compressed"));
+    // As filtered here; the mask 0 says that no filter was left out.
     if (H5Dwrite_chunk(mDataset.id(), H5P_DEFAULT, 0, start.constData(),
                        static_cast<std::size_t>(stored.size()), stored.constData()) < 0)
         return libraryFailure(QStringLiteral("cannot be written"));

@@ -9,6 +9,7 @@ namespace Kdd::VolumeFile
 namespace
 {
 
+/// A store as the library sees an open file.
 /// The library keeps its own data at the head of it.
 struct OpenStore
 {
@@ -27,11 +28,13 @@ const OpenStore& opened(const H5FD_t* file)
     return *reinterpret_cast<const OpenStore*>(file);
 }
 
+/// What the library takes for done and for failed.
 herr_t answer(bool isDone)
 {
     return isDone ? 0 : -1;
 }
 
+// The name and the flags mean nothing: the store was opened before and comes with the properties.
 H5FD_t* open(const char* /*name*/, unsigned /*flags*/, hid_t access, haddr_t /*most*/)
 {
     const auto* store = static_cast<ByteStore* const*>(H5Pget_driver_info(access));
@@ -83,6 +86,7 @@ herr_t write(H5FD_t* file, H5FD_mem_t /*kind*/, hid_t /*properties*/, haddr_t at
 herr_t truncate(H5FD_t* file, hid_t /*properties*/, hbool_t /*closing*/)
 {
     const OpenStore& own = opened(file);
+    // The library gives out room ahead of its writing, and the file must end where it was given out last.
     const auto end = static_cast<qint64>(own.end);
     return answer(end == own.store->size() || own.store->truncate(end));
 }
@@ -113,6 +117,7 @@ H5FD_class_t driverClass()
 Handle accessTo(ByteStore& store)
 {
     static const H5FD_class_t sClass = driverClass();
+    // Registered once for the process, since the library keeps it until it ends.
     static const hid_t sDriver = H5FDregister(&sClass);
     Handle access(H5Pcreate(H5P_FILE_ACCESS), H5Pclose);
     ByteStore* const info = &store;

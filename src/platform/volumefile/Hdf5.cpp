@@ -10,6 +10,7 @@ namespace
 /// The first version of object headers that has a checksum.
 constexpr unsigned kChecksummedHeader = 2;
 
+/// Walking upward begins with the innermost function, which knows the reason best.
 herr_t takeFirst(unsigned position, const H5E_error2_t* error, void* reason)
 {
     if (position == 0 && error->desc != nullptr)
@@ -33,9 +34,12 @@ struct Listing
 herr_t takeMember(hid_t /*group*/, const char* name, const H5L_info_t* info, void* target)
 {
     auto& listing = *static_cast<Listing*>(target);
+    // A soft or external link would make reading follow a path of the file's choice, perhaps into another
+    // file.
     if (info->type != H5L_TYPE_HARD || !isName(name))
         listing.refused = name;
     listing.names.append(name);
+    // One that is refused ends the walk: its name is the message.
     return listing.refused.isNull() ? 0 : 1;
 }
 
@@ -49,6 +53,8 @@ herr_t takeAttribute(hid_t /*object*/, const char* name, const H5A_info_t* /*inf
 
 QuietErrors::QuietErrors()
 {
+    // A host may have set the library's older form of printing, which cannot be read or restored by the newer
+    // functions.
     if (H5Eauto_is_v2(H5E_DEFAULT, &mIsVersion2) < 0 || mIsVersion2 == 0)
         return;
     H5Eget_auto2(H5E_DEFAULT, &mPrint, &mData);
@@ -74,6 +80,7 @@ Result listMembers(hid_t group, int limit, QVector<QByteArray>& names)
     H5G_info_t info = {};
     if (H5Gget_info(group, &info) < 0)
         return libraryFailure(QStringLiteral("cannot examine a group"));
+    // Counted before they are listed, since the list takes memory for each.
     if (info.nlinks > static_cast<hsize_t>(limit))
         return Result::failure(
             QStringLiteral("a group has %1 members, %2 are the most").arg(info.nlinks).arg(limit));
@@ -107,6 +114,7 @@ Result openMember(hid_t group, const QByteArray& name, Handle& object)
     H5O_info_t info = {};
     if (H5Oget_info2(object.id(), &info, H5O_INFO_HDR) < 0)
         return libraryFailure(failedFor("cannot examine \"%1\"", name));
+    // Damage to metadata without checksums goes unnoticed until the library follows it.
     if (info.hdr.version < kChecksummedHeader)
         return Result::failure(failedFor("\"%1\" has no checksum", name));
     return {};

@@ -13,6 +13,7 @@ namespace
 /// The number of components, and whether they have a dimension of their own.
 Result readComponents(const ChunkedData& data, int& components, bool& haveDimension)
 {
+    // Without the attribute the last dimension is that of the columns.
     haveDimension = H5Aexists(data.object(), kComponentsAttribute) > 0;
     if (!haveDimension)
         return {};
@@ -22,6 +23,7 @@ Result readComponents(const ChunkedData& data, int& components, bool& haveDimens
     if (read.bad())
         return read;
     const qint64 count = parameter.integers.value(0);
+    // They are the last dimension, so the number stands there twice and must agree.
     if (count < 1 || count > kMaxComponents || static_cast<hsize_t>(count) != data.dims().last())
         return Result::failure(QStringLiteral("has a wrong number of components"));
     components = static_cast<int>(count);
@@ -65,6 +67,7 @@ Result openLattice(hid_t group, const QByteArray& name, ChunkedData& data, Latti
             return Result::failure(
                 QStringLiteral("dimension %1 is %2 in chunks of %3").arg(i).arg(dim).arg(data.chunk().at(i)));
     }
+    // The file has the slowest dimension first, the lattice the fastest.
     for (int i = numDims - 1; i >= 0; --i)
         lattice.dims.append(static_cast<int>(data.dims().at(i)));
     return {};
@@ -78,9 +81,11 @@ Result createLattice(hid_t group, const Lattice& lattice, ChunkedData& data)
     QVector<hsize_t> dims;
     for (int i = 2; i >= 0; --i)
         dims.append(static_cast<hsize_t>(lattice.dims.at(i)));
+    // Grey pixels have no dimension for components.
     if (lattice.components > 1)
         dims.append(static_cast<hsize_t>(lattice.components));
     QVector<hsize_t> chunk = dims;
+    // One slice, so that a slice is read without the others.
     chunk.first() = 1;
     result = data.create(group, lattice.name, fileType(lattice.type), dims, chunk);
     if (result.good() && lattice.components > 1)

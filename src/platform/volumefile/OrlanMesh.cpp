@@ -17,6 +17,7 @@ namespace
 {
 
 constexpr char kSignature[] = {'\x89', 'H', 'D', 'F', '\r', '\n', '\x1a', '\n'};
+// Enough to refuse most other files without the library.
 constexpr int kHeadSize = sizeof kSignature + 1;  // and the version of the superblock
 
 /// From version 2 on there are checksums.
@@ -44,11 +45,13 @@ Result checkHead(ByteStore& store)
 
 Result checkFormat(hid_t root)
 {
+    // The head is that of any HDF5 file. What makes it a volume file stands in the attributes of its root.
     ParameterBudget budget;
     Parameter format;
     Parameter version;
     if (readAttribute(root, kFormatAttribute, budget, format).bad() || format.text != kFormatName)
         return noVolumeFile();
+    // A later format may arrange all else differently, so nothing of it is read.
     Result read = readAttribute(root, kVersionAttribute, budget, version);
     if (read.bad() || version.integers != QVector<qint64>{kFormatVersion})
         return Result::failure(QStringLiteral("is of a format version other than %1").arg(kFormatVersion));
@@ -78,6 +81,7 @@ struct KDD_LOCAL OrlanMesh::Private
     Result readCounts(const QByteArray& section, QVector<quint64>& counts) const;
 };
 
+/// The head first: a form of the file that has no checksums never reaches the library.
 Result OrlanMesh::Private::open()
 {
     Result checked = checkHead(*store);
@@ -114,6 +118,7 @@ Result OrlanMesh::Private::readMember(hid_t root, const QByteArray& member)
     if (member == kLatticesGroup)
         return readLattices(group.id());
     if (member == kParametersGroup) {
+        // One budget for the whole file, shared by all bundles below.
         ParameterBudget budget;
         return readBundle(group.id(), budget, parameters);
     }
@@ -139,6 +144,7 @@ Result OrlanMesh::Private::readLattices(hid_t group)
 /// By its name alone: what the caller's description claims is not relied upon.
 Result OrlanMesh::Private::readSlice(const QByteArray& latticeName, int slice, TypedData2D& pixels) const
 {
+    // A description may have been made for another file, or been changed since.
     int at = 0;
     while (at < lattices.size() && lattices.at(at).name != latticeName)
         ++at;
@@ -148,6 +154,7 @@ Result OrlanMesh::Private::readSlice(const QByteArray& latticeName, int slice, T
     if (slice < 0 || slice >= lattice.dims.at(2))
         return Result::failure(QStringLiteral("is not between 0 and %1").arg(lattice.dims.at(2) - 1));
     const ChunkedData& data = latticeData[static_cast<std::size_t>(at)];
+    // A chunk is a slice, so it begins at the slice's number and at 0 in all else.
     QVector<hsize_t> start(data.dims().size(), 0);
     start.first() = static_cast<hsize_t>(slice);
     QByteArray stored;
@@ -167,6 +174,7 @@ Result OrlanMesh::Private::readCounts(const QByteArray& section, QVector<quint64
         return opened;
     if (H5Tequal(data.type(), H5T_STD_U64LE) <= 0 || data.dims().size() != 1 || data.chunk() != data.dims())
         return Result::failure(QStringLiteral("is not one chunk of 64-bit counts"));
+    // The bound holds before memory is taken; readChunk has its own for the bytes in the file.
     if (elementCount(data.dims(), kMaxCounts) == 0)
         return Result::failure(
             QStringLiteral("has %1 counts, %2 are the most").arg(data.dims().first()).arg(kMaxCounts));

@@ -81,6 +81,7 @@ Result OrlanMeshWriter::Private::start()
 
 Result OrlanMeshWriter::Private::checkSlice(int slice, const TypedData2D& pixels) const
 {
+    // finish() has closed it.
     if (!data.isOpen())
         return Result::failure(QStringLiteral("comes after the end"));
     if (slice < 0 || slice >= lattice.dims.at(2))
@@ -117,6 +118,7 @@ std::unique_ptr<OrlanMeshWriter> OrlanMeshWriter::create(const QByteArray& path,
     auto d = std::make_unique<Private>();
     d->path = path;
     d->lattice = lattice;
+    // There is one lattice in a file that is written, and readers look for it under this name.
     d->lattice.name = "Level0";
     result = d->answer(d->start());
     return std::unique_ptr<OrlanMeshWriter>(result.good() ? new OrlanMeshWriter(std::move(d)) : nullptr);
@@ -132,6 +134,7 @@ Result OrlanMeshWriter::writeSlice(int slice, const TypedData2D& pixels)
         result = mPrivate->data.writeChunk(start, pixels.pixels);
     }
     result = mPrivate->answer(result.within(QStringLiteral("slice %1").arg(slice)));
+    // Only what the disk has taken counts; finish() asks for all slices.
     if (result.good())
         mPrivate->isWritten[static_cast<std::size_t>(slice)] = true;
     return result;
@@ -141,6 +144,7 @@ Result OrlanMeshWriter::writeParameters(const ParamBundle& parameters)
 {
     const QuietErrors quiet;
     Handle group;
+    // The bounds that readers hold, so that nothing is written that would not be read.
     ParameterBudget budget;
     Result result = createGroup(mPrivate->file.id(), kParametersGroup, group);
     if (result.good())
@@ -156,6 +160,7 @@ Result OrlanMeshWriter::writeDataSection(const QByteArray& name, const QVector<q
         result = Result::failure(QStringLiteral("has a wrong name or not 1 to %1 counts").arg(kMaxCounts));
     if (result.good() && mPrivate->numDataSections >= kMaxDataSections)
         result = Result::failure(QStringLiteral("is one of more than %1").arg(kMaxDataSections));
+    // The group is made with the first section, for an absent group counts as an empty one.
     if (result.good() && !mPrivate->dataSections.isOpen())
         result = createGroup(mPrivate->file.id(), kDataSectionsGroup, mPrivate->dataSections);
     ChunkedData data;
@@ -163,6 +168,7 @@ Result OrlanMeshWriter::writeDataSection(const QByteArray& name, const QVector<q
     if (result.good())
         result = data.create(mPrivate->dataSections.id(), name, H5T_STD_U64LE, dims, dims);
     const int size = counts.size() * static_cast<int>(sizeof(quint64));
+    // Not a copy: the counts outlive the call.
     if (result.good())
         result = data.writeChunk(
             {0}, QByteArray::fromRawData(reinterpret_cast<const char*>(counts.constData()), size));
@@ -174,12 +180,14 @@ Result OrlanMeshWriter::writeDataSection(const QByteArray& name, const QVector<q
 Result OrlanMeshWriter::finish()
 {
     const QuietErrors quiet;
+    // An absent slice is damage to every reader, so such a file never gets its name.
     const auto missing = std::find(mPrivate->isWritten.begin(), mPrivate->isWritten.end(), false);
     if (missing != mPrivate->isWritten.end())
         return mPrivate->answer(Result::failure(
             QStringLiteral("slice %1 is missing").arg(missing - mPrivate->isWritten.begin())));
     if (!mPrivate->file.isOpen())
         return mPrivate->answer(Result::failure(QStringLiteral("is finished already")));
+    // Closing writes what the library still held, so its failure is one of writing.
     if (!mPrivate->closeFile())
         return mPrivate->answer(libraryFailure(QStringLiteral("cannot be written")));
     return mPrivate->answer(mPrivate->part.publish());

@@ -11,6 +11,7 @@ QVector<double> Parameter::numbers() const
         return reals;
     QVector<double> numbers;
     numbers.reserve(integers.size());
+    // Above 2^53 a real does not tell neighbours apart; whoever needs that takes the integers themselves.
     for (const qint64 value : integers)
         numbers.append(static_cast<double>(value));
     return numbers;
@@ -18,6 +19,7 @@ QVector<double> Parameter::numbers() const
 
 QByteArray ParamBundle::text(const QByteArray& name) const
 {
+    // What is absent has an empty text, as a parameter of another kind has.
     return mParameters.value(name).text;
 }
 
@@ -35,6 +37,7 @@ double ParamBundle::real(const QByteArray& name, double fallback) const
 int ParamBundle::integer(const QByteArray& name, int fallback) const
 {
     using Limits = std::numeric_limits<int>;
+    // Numbers are accepted as integers and as reals alike.
     const double value = real(name, fallback);
     // Written so that a value that is no number fails it too.
     const bool fits = value >= Limits::min() && value <= Limits::max();

@@ -13,6 +13,7 @@ std::optional<Parameter::Kind> findKind(hid_t type)
 {
     if (H5Tget_class(type) == H5T_STRING && H5Tis_variable_str(type) == 0)
         return Parameter::Kind::Text;
+    // To the last bit: a narrower or foreign number would be read into the wrong places.
     if (H5Tequal(type, H5T_STD_I64LE) > 0)
         return Parameter::Kind::Integers;
     if (H5Tequal(type, H5T_IEEE_F64LE) > 0)
@@ -30,6 +31,7 @@ template <typename Number>
 QVector<Number> numbersFrom(const QByteArray& bytes)
 {
     QVector<Number> numbers(bytes.size() / static_cast<int>(sizeof(Number)));
+    // The file's byte order is this machine's, as its types were compared with.
     std::memcpy(numbers.data(), bytes.constData(), static_cast<std::size_t>(numbers.size()) * sizeof(Number));
     return numbers;
 }
@@ -51,9 +53,11 @@ qint64 countElements(hid_t attribute, Parameter::Kind kind, std::size_t elementS
     const Handle space(H5Aget_space(attribute), H5Sclose);
     const H5S_class_t shape = H5Sget_simple_extent_type(space.id());
     const bool isText = kind == Parameter::Kind::Text;
+    // A text is one element however long it is; a list of texts is nothing that is written.
     if (shape != H5S_SCALAR && (isText || shape != H5S_SIMPLE || H5Sget_simple_extent_ndims(space.id()) != 1))
         return -1;
     const hssize_t count = H5Sget_simple_extent_npoints(space.id());
+    // Divided, because the product of a claimed count and size could wrap.
     return count > kMaxParameterBytes / static_cast<qint64>(elementSize) ? -1 : count;
 }
 
@@ -65,10 +69,12 @@ Result readDataset(hid_t group, const QByteArray& name, ParameterBudget& budget,
         return opened;
     const std::optional<Parameter::Kind> kind = findKind(data.type());
     const std::size_t elementSize = H5Tget_size(data.type());
+    // A long text is a dataset of single characters.
     if (!kind || (*kind == Parameter::Kind::Text && elementSize != 1))
         return unknownType();
     if (data.dims().size() != 1 || data.chunk() != data.dims())
         return Result::failure(QStringLiteral("is not one chunk of one dimension"));
+    // The count was held against the bound on chunks while the dataset was opened.
     const qint64 bytes = elementCount(data.dims(), kMaxChunkBytes) * static_cast<qint64>(elementSize);
     Result result = spend(budget, bytes);
     QByteArray stored;
@@ -106,6 +112,7 @@ Result readMember(hid_t group, const QByteArray& name, ParameterBudget& budget, 
         bundle.insertBundle(name, below);
         return read;
     }
+    // An attribute and a dataset of one name would be one parameter with two values.
     if (bundle.contains(name))
         return Result::failure(QStringLiteral("stands there twice"));
     Parameter parameter;
@@ -143,6 +150,7 @@ Result readAttribute(hid_t object, const QByteArray& name, ParameterBudget& budg
     if (count < 0)
         return Result::failure(QStringLiteral("has a wrong shape")).within(context);
     const qint64 size = count * static_cast<qint64>(elementSize);
+    // Before memory is taken for the value.
     const Result spent = spend(budget, size);
     if (spent.bad())
         return spent.within(context);
@@ -160,8 +168,11 @@ Result readBundle(hid_t group, ParameterBudget& budget, ParamBundle& bundle)
     --budget.bundles;
     Result result = readAttributes(group, budget, bundle);
     QVector<QByteArray> names;
+    // Each member is a bundle or a parameter, so a group of more than is left of both is refused before
+    // it is listed.
     if (result.good())
         result = listMembers(group, budget.parameters + budget.bundles, names);
+    // Depth counts the way down and is given back; what bundles and parameters cost is spent for good.
     --budget.depth;
     for (int i = 0; i < names.size() && result.good(); ++i) {
         result = readMember(group, names.at(i), budget, bundle);

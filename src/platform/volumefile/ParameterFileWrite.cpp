@@ -33,12 +33,14 @@ Handle elementType(Parameter::Kind kind, int textLength)
         return {H5Tcopy(kind == Parameter::Kind::Integers ? H5T_STD_I64LE : H5T_IEEE_F64LE), H5Tclose};
     Handle type(H5Tcopy(H5T_C_S1), H5Tclose);
     H5Tset_size(type.id(), static_cast<std::size_t>(textLength));
+    // Filled up with zeros and not ended by one, so that every byte may be text.
     H5Tset_strpad(type.id(), H5T_STR_NULLPAD);
     return type;
 }
 
 Result writeDataset(hid_t group, const QByteArray& name, Parameter::Kind kind, const QByteArray& bytes)
 {
+    // Text as single characters, because readers take no elements that are longer than a number.
     const Handle type = elementType(kind, 1);
     const QVector<hsize_t> dims{static_cast<hsize_t>(bytes.size()) / H5Tget_size(type.id())};
     ChunkedData data;
@@ -52,6 +54,7 @@ Result writeParameter(hid_t group, const QByteArray& name, ParameterBudget& budg
     const qint64 size = bytesOf(parameter).size();
     if (!isName(name))
         return Result::failure(QStringLiteral("is no name of a parameter"));
+    // Readers end a text at its first zero, so what stands behind it would be lost.
     if (parameter.kind == Parameter::Kind::Text && parameter.text.contains('\0'))
         return Result::failure(QStringLiteral("has a zero in its text"));
     const Result spent = spend(budget, size);
@@ -86,6 +89,7 @@ Result writeAttribute(hid_t object, const QByteArray& name, const Parameter& par
     const Handle space(isText ? H5Screate(H5S_SCALAR) : H5Screate_simple(1, &count, nullptr), H5Sclose);
     const Handle attribute(
         H5Acreate2(object, name.constData(), type.id(), space.id(), H5P_DEFAULT, H5P_DEFAULT), H5Aclose);
+    // An empty list of numbers has a place and nothing to write there.
     if (!attribute.isOpen() || (count > 0 && H5Awrite(attribute.id(), type.id(), bytes.constData()) < 0))
         return libraryFailure(QStringLiteral("cannot be written"));
     return {};

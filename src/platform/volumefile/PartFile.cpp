@@ -26,6 +26,8 @@ PartFile::~PartFile()
 
 Result PartFile::create(const QByteArray& target)
 {
+    // A random part of the name: several processes may write the same target, and what a killed one left is
+    // in nobody's way.
     const QByteArray passing = QByteArray::number(QRandomGenerator::global()->generate64(), 16);
     const QByteArray path = target + '.' + passing + ".part";
     mDescriptor = ::open(path.constData(), O_RDWR | O_CREAT | O_EXCL | O_CLOEXEC, 0666);
@@ -45,6 +47,7 @@ void PartFile::fail(int error)
 bool PartFile::write(qint64 at, const void* bytes, std::size_t size)
 {
     const auto* from = static_cast<const char*>(bytes);
+    // The size grows also after an error, since the library is told that all is well.
     mSize = std::max(mSize, at + static_cast<qint64>(size));
     while (size > 0 && mError == 0) {
         const ssize_t written = ::pwrite(mDescriptor, from, size, at);
@@ -84,6 +87,7 @@ bool PartFile::read(qint64 at, void* bytes, std::size_t size)
         at += got;
         size -= static_cast<std::size_t>(got);
     }
+    // The library may read what it has given out and never written.
     std::memset(to, 0, size);
     return true;
 }
@@ -103,6 +107,7 @@ Result PartFile::publish()
         fail(errno);
     if (mError != 0)
         return state();
+    // From here on readers find it, and it takes the place of a file that had the name.
     if (std::rename(mPath.constData(), mTarget.constData()) != 0)
         return Result(SystemResult::of(errno)).within(QStringLiteral("cannot be named"));
     mPath.clear();

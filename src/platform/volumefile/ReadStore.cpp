@@ -23,6 +23,7 @@ Result FileToRead::open(const QByteArray& path)
 
 bool FileToRead::read(qint64 at, void* bytes, std::size_t size)
 {
+    // Divided into two questions, because place and size are claims of the file and their sum could wrap.
     if (at < 0 || at > mFile.size() || size > static_cast<std::size_t>(mFile.size() - at))
         return false;
     const auto count = static_cast<qint64>(size);

@@ -19,6 +19,7 @@ std::vector<std::string> SOPInstanceUtility::sopUIDList(const ParamBundle& sopIn
 {
     const QByteArray text = sopInstanceUIDs.text(kName);
     std::vector<std::string> uids;
+    // Splitting an empty text would give one empty UID.
     if (text.isEmpty())
         return uids;
     const QList<QByteArray> values = text.split(kSeparator);
@@ -34,6 +35,7 @@ ParamBundle SOPInstanceUtility::bundleOf(const std::vector<std::string>& sopUIDs
     for (const std::string& uid : sopUIDs) {
         if (&uid != &sopUIDs.front())
             text += kSeparator;
+        // Up to the first zero: a text with one could not be written.
         text += uid.c_str();
     }
     ParamBundle bundle;

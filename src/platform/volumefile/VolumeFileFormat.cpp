@@ -28,8 +28,10 @@ hid_t fileType(PrimitiveType type)
 
 std::optional<PrimitiveType> findPrimitiveType(hid_t type)
 {
+    // The codes are numbered without a gap, and sizeOf is 0 behind the last one.
     for (int code = 0; sizeOf(static_cast<PrimitiveType>(code)) > 0; ++code) {
         const auto candidate = static_cast<PrimitiveType>(code);
+        // Byte order, sign and size: all of it must be as in one of ours.
         if (H5Tequal(type, fileType(candidate)) > 0)
             return candidate;
     }

@@ -15,6 +15,7 @@ constexpr int kTooMany = 100 * 1000 * 1000;
 
 int partNumberOfFile(const QByteArray& path)
 {
+    // Behind the last separator of either kind: a folder's "_part" does not count.
     return partNumberOf(path.mid(qMax(path.lastIndexOf('/'), path.lastIndexOf('\\')) + 1));
 }
 
@@ -26,6 +27,7 @@ int partNumberOf(const QByteArray& name)
     if (part < 0)
         return -1;
     int number = 0;
+    // A number that gets too large stays where it is, so that a name of many digits cannot overflow.
     for (int i = part + static_cast<int>(qstrlen(kPart)); i < name.size() && number < kTooMany; ++i) {
         const char digit = name.at(i);
         if (digit < '0' || digit > '9')

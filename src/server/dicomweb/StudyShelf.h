@@ -4,6 +4,7 @@
 
 #include <kddlib/TagFile.h>
 
+#include <chrono>
 #include <memory>
 #include <mutex>
 
@@ -52,7 +53,10 @@ class StudyShelf
 {
 public:
     /// `capacity` bounds what is kept by the tag files' uncompressed size [bytes]; the study looked up last always is.
-    explicit StudyShelf(qint64 capacity);
+    /// Two writes within one tick of a file system's clock leave the same times, and some tick once in two seconds: a file
+    /// that was younger than `settledAge` when it was read is read again by whoever asks next.
+    explicit StudyShelf(qint64 capacity,
+                        std::chrono::nanoseconds settledAge = std::chrono::milliseconds(2500));
     ~StudyShelf();
 
     /// The study as its file is now.

@@ -40,14 +40,17 @@ void printTotals(const QMap<QByteArray, StudyTotals>& studies)
                      QString::number(study.volumes), humanBytes(study.fileBytes),
                      humanBytes(study.headerBytes), humanBytes(study.tagFileBytes)});
     }
+    // A heading without rows says nothing that the line of the totals does not say.
     if (rows.size() > 1)
         printTable(rows);
 }
 
+/// Also after a failure: what was taken until then is taken.
 void report(const GlobalOptions& options, const FileScan& scan, const StudyIntake& intake)
 {
     const QMap<QByteArray, StudyTotals>& studies = intake.studies();
     const StudyTotals all = sumOf(studies);
+    // To whoever asked it is one list, whether a file could not be read or what was in it could not be taken.
     std::vector<RefusedFile> refused = scan.refused();
     refused.insert(refused.end(), intake.refused().begin(), intake.refused().end());
     const int failed = static_cast<int>(refused.size());
@@ -77,18 +80,22 @@ Outcome runAdd(const GlobalOptions& options, const ScanRequest& request)
         return Outcome::Failed;
     CommandProgress progress("Taking", !options.quiet);
     FileScan scan(*database, progress);
+    // The archive may lie below the paths, and must not take in what it keeps itself.
     scan.setOwnPlaces(ownPlaces(options));
     scan.setNamesSkipped(options.verbose);
     scan.setDamage(request.tolerant ? Damage::Tolerated : Damage::Refused);
+    // Gathers what the scan hands on, so that a study is completed once for all its files.
     StudyIntake intake(*database, progress);
     Result taken = scan.run(request.paths, [&](DicomInput input) { return intake.take(std::move(input)); });
     if (taken.good())
         taken = intake.finish();
+    // Unchanged files may be those of an earlier run that was ended before their studies were complete.
     if (taken.good() && scan.unchanged() > 0)
         taken = intake.completeWaiting(request.paths);
     const bool isDone = succeeded(taken);
     report(options, scan, intake);
     const QByteArray finished = QByteArray::number(intake.studies().size()) + " studies are complete";
+    // An interrupt is told in any case, also when something else failed.
     const bool isWhole =
         !toldOfInterrupt(finished.constData()) && scan.refused().empty() && intake.refused().empty();
     return isDone && isWhole ? Outcome::Done : Outcome::Failed;
@@ -106,6 +113,8 @@ void declareAdd(CommandSet& commands)
         "kdd add day                            # a folder\n"
         "kdd --json add day/*/*                 # counts for a script\n"
         "kdd add --tolerant day --verbose       # also of damaged files what is sound"};
+    // Filled while the command line is read and used when the command runs, which is later than this
+    // function.
     const auto request = std::make_shared<ScanRequest>();
     ArgumentList arguments =
         commands.declare(text, [request](const GlobalOptions& options) { return runAdd(options, *request); });

@@ -19,14 +19,17 @@ QByteArray keyText(const DcmTagKey& key)
 
 QByteArray keywordOf(const TagMap& node, const DcmTagKey& key)
 {
+    // A private attribute has its name by its creator.
     DcmTag tag(key, node.privateCreator(key));
     const char* name = tag.getTagName();
+    // For a key that it does not know the dictionary has a name that is none.
     return std::strcmp(name, DcmTag_ERROR_TagName) == 0 ? QByteArray() : QByteArray(name);
 }
 
 QString displayText(const TagMap& node, const QByteArray& bytes)
 {
     QByteArray characterSet;
+    // As the node shows it, so that an inherited character set counts too.
     node.findAndGetString(DCM_SpecificCharacterSet, characterSet);
     return withoutControls(decodeText(bytes, characterSet));
 }

@@ -99,6 +99,7 @@ std::vector<std::string> namesOf(const CLI::Option& option)
 
 void writeTables(std::ostream& out, const CLI::App& app)
 {
+    // What values there are is kept by option, and for those without option by their place.
     std::string options;
     std::string kinds;
     std::string places;
@@ -123,6 +124,7 @@ void writeTables(std::ostream& out, const CLI::App& app)
 
 void writeBashCompletion(std::ostream& out, const CLI::App& app)
 {
+    // The tables first, because the script reads them when the user asks for a completion.
     out << kTables << "_kdd_commands='";
     for (const CLI::App* command : app.get_subcommands({}))
         out << command->get_name() << ' ';

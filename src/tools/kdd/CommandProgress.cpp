@@ -10,8 +10,10 @@ namespace Kdd
 namespace
 {
 
+// The one type that a signal handler may write.
 volatile std::sig_atomic_t sInterrupted = 0;
 
+/// Little is allowed in a handler: a mark is set, and a second signal finds the system's own way again.
 void noteInterrupt(int signal)
 {
     sInterrupted = 1;

@@ -20,6 +20,7 @@ QByteArray bytes(const std::string& text)
 
 void present(CLI::Option& option, const Argument& argument)
 {
+    // The kind is what help, manual and completion tell of the value.
     option.type_name(argument.kind);
     option.required(argument.isRequired);
 }
@@ -41,6 +42,7 @@ void ArgumentList::flag(const char* name, bool& value, const char* what)
 
 void ArgumentList::number(const char* name, int least, int greatest, int& value, const char* what)
 {
+    // The parser refuses what lies outside, so no command checks its numbers itself.
     CLI::Range range(least, greatest);
     range.description("");  // the kind tells it already
     const std::string kind = std::to_string(least) + '-' + std::to_string(greatest);
@@ -79,10 +81,13 @@ void ArgumentList::path(const Argument& argument, QString& value)
 
 ArgumentList CommandSet::declare(const CommandText& text, const Run& run)
 {
+    // The parser knows one text for both; summaryOf and detailsOf take it apart again.
     CLI::App* command = mApp.add_subcommand(text.name, std::string(text.summary) + "\n\n" + text.details);
     command->group(text.group);
     command->footer(text.examples);
+    // The options of every command may stand behind its name, too.
     command->fallthrough();
+    // Run later, when the whole line is read and the global options are in force.
     command->callback([&chosen = mChosen, run] { chosen = run; });
     return ArgumentList(*command);
 }

@@ -12,6 +12,7 @@ namespace Kdd
 namespace
 {
 
+// A sheet of some 7,400 x 5,000 pixels.
 constexpr int kMaxPictures = 2000;
 constexpr int kCell = 128;  // [pixels]
 constexpr int kGap = 6;     // [pixels]
@@ -42,6 +43,7 @@ Result writeContactSheet(const QString& folder, const QString& path)
     const int rows = (names.size() + columns - 1) / columns;
     QImage sheet(kGap + columns * (kCell + kGap), kGap + rows * (kCell + kGap), QImage::Format_RGB32);
     sheet.fill(kBackground);
+    // The painter ends before the picture is saved.
     {
         QPainter painter(&sheet);
         for (int i = 0; i < names.size(); ++i) {

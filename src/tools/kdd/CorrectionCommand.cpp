@@ -28,6 +28,7 @@ struct CorrectionRequest
     QString imageList;  ///< file that names further images, one on each line; empty for none
 };
 
+// Room for a million UIDs.
 constexpr qint64 kMaxImageList = 64 * 1024 * 1024;
 
 bool readFile(const QString& name, qint64 limit, QByteArray& content)
@@ -51,6 +52,7 @@ bool readJob(const CorrectionRequest& request, QAData& job)
     QString message;
     if (!readFile(request.job, kMaxJobXml, xml))
         return false;
+    // The message names the line, and here the file is added.
     if (job.parse(xml, message))
         return true;
     LogFile::errorf("%s: %s", qUtf8Printable(request.job), qUtf8Printable(message));
@@ -65,12 +67,14 @@ bool readImages(const CorrectionRequest& request, QAData& job)
         return false;
     for (const QByteArray& line : list.split('\n')) {
         const QByteArray uid = line.trimmed();
+        // The last line ends in a line feed, behind which there is an empty one.
         if (!uid.isEmpty())
             job.images.append(uid);
     }
     return true;
 }
 
+/// Asked of the folder, because a study that the database does not know can be corrected as well.
 bool hasTagFile(const QByteArray& studyUID)
 {
     return QFile::exists(TagFile::cacheFilePathForStudy(studyUID.constData()));
@@ -80,8 +84,10 @@ bool hasTagFile(const QByteArray& studyUID)
 bool resolveStudies(const CorrectionRequest& request, QAData& job)
 {
     job.studyUID = request.study;
+    // No move: the study is there, and a beginning of its UID is enough.
     if (job.oldStudyUID.isEmpty())
         return resolveStudy(request.study, job.studyUID);
+    // Either will do: a first move has to make the one, and one that broke off may have emptied the other.
     if (hasTagFile(job.oldStudyUID) || hasTagFile(job.studyUID))
         return true;
     LogFile::errorf("Neither study %s nor study %s has a tag file", job.oldStudyUID.constData(),
@@ -92,6 +98,7 @@ bool resolveStudies(const CorrectionRequest& request, QAData& job)
 void report(const GlobalOptions& options, const QAData& job)
 {
     const QAData::Outcome& outcome = job.outcome;
+    // Told of the study in which they were looked for, which of a move is the old one.
     for (const QByteArray& uid : outcome.notFound)
         LogFile::errorf("There is no image %s in study %s", uid.constData(),
                         (job.oldStudyUID.isEmpty() ? job.studyUID : job.oldStudyUID).constData());
@@ -119,6 +126,7 @@ Outcome runCorrection(const GlobalOptions& options, const CorrectionRequest& req
     if (!succeeded(StudyChange::correct(job).within(QStringLiteral("The correction is not made"))))
         return Outcome::Failed;
     report(options, job);
+    // The others are corrected, but not all that was asked for is done.
     return job.outcome.notFound.isEmpty() ? Outcome::Done : Outcome::Failed;
 }
 

@@ -36,11 +36,13 @@ bool chooseStudies(Kxg::Catalogue& database, const QList<QByteArray>& named, boo
         }
         return true;
     }
+    // All names are looked up before it fails, so that every fault is told at once.
     bool allFound = true;
     for (const QByteArray& text : named) {
         QByteArray studyUID;
         if (!resolveStudy(database, text, studyUID))
             allFound = false;
+        // Whoever names a study twice has it worked on once.
         else if (!studyUIDs.contains(studyUID))
             studyUIDs.append(studyUID);
     }

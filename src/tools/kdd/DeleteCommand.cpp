@@ -11,6 +11,7 @@ namespace Kdd
 namespace
 {
 
+/// A beginning is enough for the study; a series or an image is named in full.
 Outcome runDelete(const GlobalOptions& options, const NodeSelection& selection)
 {
     QByteArray studyUID;
@@ -18,6 +19,7 @@ Outcome runDelete(const GlobalOptions& options, const NodeSelection& selection)
     if (database == nullptr || !resolveStudy(*database, selection.study, studyUID) ||
         !succeeded(StudyChange(*database).remove({studyUID, selection.series, selection.image})))
         return Outcome::Failed;
+    // One node is named, so one is what was deleted.
     if (options.json)
         printJson({{QStringLiteral("deleted"), 1}});
     return Outcome::Done;

@@ -1,4 +1,4 @@
-#include "tools/kdd/AttributeDiff.h"
+#include "tools/kdd/AttributeText.h"
 #include "tools/kdd/Commands.h"
 #include "tools/kdd/Report.h"
 #include "tools/kdd/Store.h"
@@ -6,9 +6,11 @@
 #include <QFileInfo>
 #include <QJsonArray>
 
+#include <kddlib/AttributeDifference.h>
 #include <kddlib/DicomInput.h>
 #include <kddlib/LogFile.h>
 #include <kddlib/TagMap.h>
+#include <kddlib/TagSequence.h>
 
 #include <cstdio>
 #include <memory>
@@ -25,27 +27,64 @@ struct DiffRequest
     QString right;
 };
 
+// The first bytes of every tag file.
 constexpr char kTagFileMagic[] = "TaCa";
 
 bool isTagFile(const QString& path)
 {
     QFile file(path);
+    // By what it begins with: copies of tag files may have any name.
     return file.open(QIODevice::ReadOnly) && file.read(4) == kTagFileMagic;
 }
 
 /// Reads what the user names: a tag file, a DICOM file, or a study of the store.
 bool readNamed(const QString& name, TagFile& file)
 {
+    // A file goes before a study of the same name.
     if (!QFileInfo(name).isFile())
         return readStudy(name.toLocal8Bit(), file);
     if (isTagFile(name))
         return readTagFile(name, file);
     const QByteArray path = name.toLocal8Bit();
+    // What is left out of a damaged file would show as a difference.
     DicomInput input = readDicomInput(path, Damage::Refused);
+    // Into an empty study, of which it is then the only image.
     if (input.kind == DicomInput::Kind::Image)
         return file.addTagMap(input.map.release(), path.constData(), true) != nullptr;
     LogFile::errorf("Could not load %s: %s", qUtf8Printable(name), qUtf8Printable(input.reason));
     return false;
+}
+
+/// What is printed of a difference.
+struct DiffLine
+{
+    QByteArray path;  ///< "(0008,1140)[0].(0008,1150)"
+    QByteArray name;  ///< the dictionary's keyword; empty when it has none
+    QByteArray left;  ///< "UI [1.2.3]", or "-" where the node has no such attribute
+    QByteArray right;
+};
+
+/// The value as a difference shows it. Sequences and omitted values have none to show.
+QByteArray describe(const TagMap* node, const DcmTagKey& key)
+{
+    if (node == nullptr)
+        return "-";
+    const TagElement& element = *node->findElement(key);
+    if (element.isSequence())
+        return "SQ of " + QByteArray::number(static_cast<const TagSequence&>(element).numItems()) + " items";
+    if (element.markedAsOmitted())
+        return "omitted";
+    QByteArray text;
+    node->findAndGetString(key, text);
+    return QByteArray(vrName(element.vr())) + " [" + text + ']';
+}
+
+DiffLine lineOf(const AttributeDifference& difference)
+{
+    // A private name needs the creator, which stands where the attribute does.
+    const TagMap& named = difference.left != nullptr ? *difference.left : *difference.right;
+    return {difference.path + keyText(difference.key), keywordOf(named, difference.key),
+            describe(difference.left, difference.key), describe(difference.right, difference.key)};
 }
 
 class Comparison
@@ -56,6 +95,7 @@ public:
     {
     }
 
+    /// Image by image, with what each inherits: where a value is stored makes no difference.
     void compare(const TagFile& left, const TagFile& right)
     {
         const auto& mine = left.imagesByUID();
@@ -71,6 +111,7 @@ public:
             else
                 tell(it.key(), {"", "", "image", "-"});
         }
+        // What only the right side has.
         for (auto it = theirs.cbegin(); it != theirs.cend(); ++it) {
             if (!mine.contains(it.key()))
                 tell(it.key(), {"", "", "-", "image"});
@@ -83,19 +124,24 @@ public:
             printJson({{QStringLiteral("differences"), mList}});
         else if (!mOptions.quiet)
             std::printf("%d differences\n", mCount);
+        // A difference is a fault that was found.
         return mCount == 0 ? Outcome::Done : Outcome::Failed;
     }
 
 private:
     void compareImages(const QByteArray& key, const TagMap& left, const TagMap& right)
     {
-        compareNodes(left, right, [&](const AttributeDifference& difference) { tell(key, difference); });
+        compareNodes(left, right, [&](const AttributeDifference& difference) {
+            tell(key, lineOf(difference));
+            return true;
+        });
     }
 
-    void tell(const QByteArray& image, const AttributeDifference& difference)
+    void tell(const QByteArray& image, const DiffLine& difference)
     {
         ++mCount;
         if (mOptions.json) {
+            // Kept until the end, since the result is one value.
             mList.append(QJsonObject{{QStringLiteral("image"), displayText(image)},
                                      {QStringLiteral("path"), displayText(difference.path)},
                                      {QStringLiteral("name"), displayText(difference.name)},

@@ -39,6 +39,7 @@ QString nameInUrl(const QByteArray& url)
     const bool isCloud = url.startsWith("gs:");
     const QByteArray path =
         url.split('?').first().split(isCloud ? '?' : '#').first().mid(url.indexOf(':') + 1);
+    // An encoded slash must not lead into another folder.
     return QUrl::fromPercentEncoding(path.mid(path.lastIndexOf('/') + 1))
         .replace(QLatin1Char('/'), QLatin1Char('_'));
 }
@@ -50,6 +51,7 @@ QString targetOf(const GetRequest& request)
     if (!request.file.isEmpty() && !isFolder)
         return request.file;
     const QString name = nameInUrl(request.url);
+    // Nothing at all, or the name of a folder.
     if (name.isEmpty() || name == QLatin1String(".") || name == QLatin1String("..")) {
         LogFile::errorf("%s has no file name: give one with -o", request.url.constData());
         return {};
@@ -84,6 +86,7 @@ private:
 
     PartialFile::Origin origin()
     {
+        // As this response tells of it.
         return {mRequest.url, ObjectVersion::of(mStream.httpStatus()), mStream.contentLength()};
     }
 
@@ -105,9 +108,11 @@ bool Fetch::hasContent()
 
 bool Fetch::begin()
 {
+    // A part that cannot be continued is no fault: the object is then fetched anew.
     if (!goOn() && !beginAnew())
         return false;
     mDone = mResumedAt;
+    // Of the whole object, also when only the rest of it comes.
     mLength = mStream.contentLength();
     return true;
 }
@@ -117,9 +122,12 @@ bool Fetch::goOn()
 {
     const PartialFile::Origin known = mFile.origin();
     const qint64 size = mFile.size();
+    // A part that is complete leaves nothing to ask for, so nothing could tell whether it still is the same
+    // object.
     if (!known.isRecognisable() || known.url != mRequest.url || size == 0 || size >= known.length)
         return false;
     mStream = KxCurlClient::instance().readFollowing(mRequest.url.toStdString(), size);
+    // Halves of two versions would make a file that there never was.
     const bool isSame = hasContent() && origin().version == known.version && origin().length == known.length;
     if (isSame && mFile.goToEnd())
         mResumedAt = size;
@@ -150,6 +158,7 @@ bool Fetch::copy()
     for (int turn = 0;; turn = 1 - turn) {
         const char* const block = blocks[turn].get();
         const qint64 count = mStream.read(blocks[turn].get(), kBlock).gcount();
+        // The other block is filled next, so what was in it has to be written by now.
         if (writing.valid() && !writing.get())
             return false;
         if (count == 0)
@@ -162,8 +171,10 @@ bool Fetch::copy()
 
 bool Fetch::isComplete()
 {
+    // The stream ends alike for a whole object and for one that broke off; only the status tells.
     if (!mStream.httpStatus().ok())
         return explain();
+    // A transfer may end too early without any error.
     if (mLength > 0 && mDone != mLength) {
         LogFile::errorf("%s cannot be fetched: %lld of %lld bytes came", mRequest.url.constData(),
                         static_cast<long long>(mDone), static_cast<long long>(mLength));
@@ -200,13 +211,16 @@ Outcome runGet(const GlobalOptions& options, const GetRequest& request)
     if (target.isEmpty())
         return Outcome::WrongUsage;
     PartialFile file(target);
+    // Locked before anything is asked for, so that two processes do not fetch the same file.
     if (!file.open())
         return Outcome::Failed;
+    // Settings of the whole process, which fetches nothing else.
     KxCurlClient::instance().setNumConcurrentRequestsPerFile(request.parallel);
     KxCurlClient::instance().setChunkSizeForPartialRequests(kRange);
     Fetch fetch(request, options, file);
     if (!fetch.run()) {
         file.removeIfEmpty();
+        // Only of a part that a later run recognises there is something to tell.
         if (file.origin().isRecognisable())
             LogFile::warnf("%s is kept: the same command goes on from there", qUtf8Printable(file.path()));
         return Outcome::Failed;

@@ -30,6 +30,7 @@ const std::map<std::string, TagFile::CompressionMode> kCompressionNames = {
 /// The first that is not empty.
 QByteArray firstOf(const QList<QByteArray>& texts)
 {
+    // The last one is taken in any case.
     return *std::find_if(texts.begin(), texts.end() - 1,
                          [](const QByteArray& text) { return !text.isEmpty(); });
 }
@@ -65,6 +66,7 @@ void GlobalArguments::addTo(CLI::App& app)
 
 const GlobalOptions& GlobalArguments::apply()
 {
+    // First, so that whatever is logged from here on is written as it was asked for.
     applyLogging();
     applyStore();
     return mOptions;
@@ -92,8 +94,10 @@ void GlobalArguments::applyLogging() const
 
 void GlobalArguments::applyStore()
 {
+    // Set for the whole process before there is a second thread.
     mOptions.store = storeFolder();
     const QByteArray root = pathBytes(mOptions.store);
+    // What the command line says goes before the site's settings, and these before a place in the store.
     const QByteArray meta =
         firstOf({QByteArray::fromStdString(mMeta), ExResource::metaFolder(), root + "/meta"});
     Kxg::SetDatabaseServer(firstOf({QByteArray::fromStdString(mDatabase), ExResource::databaseAddress(),

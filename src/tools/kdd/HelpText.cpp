@@ -16,6 +16,7 @@ std::string wrapped(const std::string& text)
     std::string lines;
     std::string word;
     for (std::size_t column = 0; words >> word; column += word.size()) {
+        // A word that does not fit together with the blank before it begins a line.
         const bool isNewLine = column > 0 && column + 1 + word.size() > kWidth;
         if (column > 0)
             lines += isNewLine ? '\n' : ' ';
@@ -34,6 +35,7 @@ std::string indented(const std::string& lines)
 
 std::string HelpText::make_description(const CLI::App* app) const
 {
+    // The tool itself has a summary only.
     const std::string details = detailsOf(*app);
     return summaryOf(*app) + "\n" + (details.empty() ? "" : "\n" + wrapped(details) + "\n\n");
 }
@@ -49,12 +51,14 @@ std::string HelpText::make_option_opts(const CLI::Option* option) const
 std::string HelpText::make_subcommand(const CLI::App* command) const
 {
     std::ostringstream out;
+    // The list of commands has the summaries only; the details come with a command's own help.
     CLI::detail::format_help(out, command->get_name(), summaryOf(*command), get_column_width());
     return out.str();
 }
 
 std::string HelpText::make_footer(const CLI::App* app) const
 {
+    // The tool as a whole has a hint there and no examples.
     if (app->get_parent() == nullptr)
         return app->get_footer() + "\n";
     return "Examples:\n" + indented(app->get_footer()) +
@@ -76,6 +80,7 @@ std::string detailsOf(const CLI::App& command)
 
 std::string kindOf(const CLI::Option& option)
 {
+    // A flag has no value, though the parser may have a name for its type.
     return option.get_type_size() == 0 ? std::string() : option.get_type_name();
 }
 

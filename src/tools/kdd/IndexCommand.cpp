@@ -17,6 +17,7 @@ namespace Kdd
 namespace
 {
 
+/// The same scan as when images are taken in, but the studies are left waiting for others to build.
 Outcome runIndex(const GlobalOptions& options, const ScanRequest& request)
 {
     const std::unique_ptr<Kxg::Catalogue> database = openDatabase();
@@ -24,14 +25,17 @@ Outcome runIndex(const GlobalOptions& options, const ScanRequest& request)
         return Outcome::Failed;
     CommandProgress progress("Reading", !options.quiet);
     FileScan scan(*database, progress);
+    // The archive may lie below the paths, and must not take in what it keeps itself.
     scan.setOwnPlaces(ownPlaces(options));
     scan.setNamesSkipped(options.verbose);
     scan.setDamage(request.tolerant ? Damage::Tolerated : Damage::Refused);
     Registration registration(*database);
     Result registered =
         scan.run(request.paths, [&](const DicomInput& input) { return registration.add(input); });
+    // The last files are still held back, as registering is done for many at once.
     if (registered.good())
         registered = registration.flush();
+    // Counts are told after a failure as well: what is registered stays registered.
     const bool isDone = succeeded(registered);
     const int studies = registration.studies().size();
     const int failed = static_cast<int>(scan.refused().size());

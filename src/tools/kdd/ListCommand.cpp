@@ -43,6 +43,7 @@ struct ListedStudy
 ListedStudy describe(const Kxg::StudySummary& study)
 {
     const QString tagFile = TagFile::cacheFilePathForStudy(study.studyInstanceUID.constData());
+    // Values come from files, and a terminal must not obey what is in them.
     return {displayText(study.studyInstanceUID),
             displayText(study.patientName),
             displayText(study.studyDate),
@@ -80,6 +81,7 @@ void printList(const QList<ListedStudy>& studies)
     for (const ListedStudy& study : studies)
         rows.append({study.uid, study.patient, study.date, study.modalities, QString::number(study.series),
                      QString::number(study.images), QString::number(study.volumes),
+                     // The size of a tag file that is about to be written anew says little.
                      study.isWaiting ? QStringLiteral("waiting") : humanBytes(study.bytes)});
     printTable(rows);
 }
@@ -90,6 +92,7 @@ class DateRange
 public:
     bool parse(const QByteArray& text)
     {
+        // A day alone is the range from itself to itself.
         const int dash = text.indexOf('-');
         mFrom = dash < 0 ? text : text.left(dash);
         mTo = dash < 0 ? text : text.mid(dash + 1);
@@ -117,8 +120,11 @@ private:
 
 bool passes(const Kxg::StudySummary& study, const ListRequest& request)
 {
+    // With a line feed between them, so that nothing is found across the two.
     const QString patient = QString::fromUtf8(study.patientName + '\n' + study.patientID);
+    // An empty text is part of every other one.
     return patient.contains(QString::fromLocal8Bit(request.patient), Qt::CaseInsensitive) &&
+           // Modalities are written in capital letters.
            (request.modality.isEmpty() || study.modalities.split(' ').contains(request.modality.toUpper())) &&
            (!request.waiting || study.isWaiting);
 }
@@ -126,6 +132,7 @@ bool passes(const Kxg::StudySummary& study, const ListRequest& request)
 Outcome runList(const GlobalOptions& options, const ListRequest& request)
 {
     DateRange dates;
+    // Refused before the database is asked.
     if (!dates.parse(request.date)) {
         LogFile::errorf("\"%s\" is no date YYYYMMDD and no range of dates", request.date.constData());
         return Outcome::WrongUsage;

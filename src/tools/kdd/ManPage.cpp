@@ -77,11 +77,13 @@ void writeCommand(std::ostream& out, const CLI::App& command)
 {
     const std::string name = "kdd " + command.get_name();
     const std::string usage = HelpText().make_usage(&command, name);
+    // The line of the usage without its heading, which the page has of its own.
     out << ".SS " << escaped(name) << '\n'
         << escaped(summaryOf(command)) << ".\n.PP\n"
         << escaped(usage.substr(usage.find(name), usage.find('\n') - usage.find(name))) << "\n.PP\n"
         << escaped(detailsOf(command)) << '\n';
     writeOptions(out, command);
+    // Examples stand line by line as they are.
     out << ".PP\n.EX\n" << escaped(command.get_footer()) << "\n.EE\n";
 }
 
@@ -89,6 +91,7 @@ void writeCommand(std::ostream& out, const CLI::App& command)
 
 void writeManPage(std::ostream& out, const CLI::App& app)
 {
+    // Without a date, so that the same sources give the same page.
     out << ".TH KDD 1 \"\" \"" << escaped(BuildInfo::text()) << "\" \"User Commands\"\n.SH NAME\nkdd \\- "
         << escaped(summaryOf(app))
         << "\n.SH SYNOPSIS\n.B kdd\n[\\fIOPTIONS\\fR] \\fICOMMAND\\fR [\\fIARGUMENTS\\fR]\n"

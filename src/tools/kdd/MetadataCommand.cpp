@@ -12,6 +12,7 @@ namespace Kdd
 namespace
 {
 
+/// All images at or below a node, in the order of the tree.
 void collectImages(const TagMap& node, QList<const TagMap*>& images)
 {
     if (depthOf(node) == 2)
@@ -28,12 +29,17 @@ Outcome runMetadata(const GlobalOptions& /*options*/, const NodeSelection& selec
         return Outcome::Failed;
     QList<const TagMap*> images;
     collectImages(*node, images);
+    // Written image by image: as a whole the array may be many times as large as the study's tag file.
+    DicomImageWriter writer(MetadataForm::Json);
+    QByteArray text;
     const char* separator = "[\n";
     for (const TagMap* image : qAsConst(images)) {
-        std::cout << separator;
-        writeDicomJson(std::cout, *image, bulkDataRoot(*image));
+        text = separator;
+        writer.append(text, *image, QByteArray::fromStdString(bulkDataRoot(*image)));
+        std::cout.write(text.constData(), text.size());
         separator = ",\n";
     }
+    // Without images it is an empty array, so that the result is valid in any case.
     std::cout << (images.isEmpty() ? "[]\n" : "\n]\n") << std::flush;
     return Outcome::Done;
 }

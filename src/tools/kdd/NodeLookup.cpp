@@ -18,9 +18,11 @@ TagMap* findNode(const NodeSelection& selection, TagFile& file)
                         selection.series.constData());
         return nullptr;
     }
+    // The deepest node that is named is the one that is meant.
     if (selection.image.isEmpty())
         return selection.series.isEmpty() ? file.study().get() : series;
     TagMap* image = file.findImage(selection.image);
+    // Looked for in the whole study, and then held against the series that was named.
     if (image != nullptr && (selection.series.isEmpty() || image->parent() == series))
         return image;
     LogFile::errorf("Study %s has no image %s%s%s", file.studyInstanceUID().constData(),

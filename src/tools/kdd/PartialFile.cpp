@@ -25,6 +25,7 @@ const QString kLastModified = QStringLiteral("lastModified");
 const QString kLength = QStringLiteral("length");
 const QString kBoot = QStringLiteral("boot");
 
+// Records are far shorter; no more is read of what may be a foreign file.
 constexpr qint64 kLongestRecord = 64 * 1024;  // [bytes]
 
 /// Another one after each start of the machine.
@@ -60,6 +61,7 @@ bool PartialFile::refuse(const char* action, const QString& reason) const
 bool PartialFile::open()
 {
     const LockedOpenResult result =
+        // One attempt, because whoever holds the part does so until his transfer ends.
         openLockedFile(mFile, path(), FileLock::Exclusive, IfAbsent::Create, LockPolling{1, 0});
     if (result)
         return true;
@@ -74,6 +76,8 @@ PartialFile::Origin PartialFile::origin() const
     if (!record.open(QIODevice::ReadOnly))
         return {};
     const QJsonObject object = QJsonDocument::fromJson(record.read(kLongestRecord)).object();
+    // The machine has been started anew: the length may be right while bytes in the middle never reached the
+    // disk.
     if (object[kBoot].toString() != bootId())
         return {};
     return {object[kUrl].toString().toUtf8(),
@@ -87,12 +91,15 @@ bool PartialFile::startOver(const Origin& origin)
     QFile::remove(recordPath());
     if (!mFile.resize(0) || !mFile.seek(0))
         return refuse("cannot be emptied", mFile.errorString());
+    // A part of unknown origin cannot be continued, so it gets no record.
     if (!origin.isRecognisable())
         return true;
+    // The length as a text, for a number of JSON is a real.
     const QJsonObject object{
         {kUrl, QString::fromUtf8(origin.url)},          {kEntityTag, text(origin.version.entityTag)},
         {kGeneration, text(origin.version.generation)}, {kLastModified, text(origin.version.lastModified)},
         {kLength, QString::number(origin.length)},      {kBoot, bootId()}};
+    // It takes its place as a whole, so half a record is never read.
     QSaveFile record(recordPath());
     if (record.open(QIODevice::WriteOnly) && record.write(QJsonDocument(object).toJson()) > 0 &&
         record.commit())
@@ -122,16 +129,19 @@ bool PartialFile::append(const char* bytes, qint64 count)
 
 bool PartialFile::publish(bool flush)
 {
+    // First the bytes, so that what has the name is complete also after a loss of power.
     const bool isOnDisk = !flush || ::fsync(mFile.handle()) == 0;
     if (!isOnDisk ||
         std::rename(QFile::encodeName(path()).constData(), QFile::encodeName(mTarget).constData()) != 0)
         return refuse("cannot be given its name", QString::fromLocal8Bit(std::strerror(errno)));
+    // Left behind by a crash it tells of a part that is not there, and nothing is continued without bytes.
     QFile::remove(recordPath());
     return true;
 }
 
 void PartialFile::removeIfEmpty()
 {
+    // Still under the lock, so nobody else is fetching into it.
     if (mFile.isOpen() && mFile.size() == 0) {
         QFile::remove(recordPath());
         QFile::remove(path());

@@ -27,7 +27,9 @@ struct PreviewsRequest
 Outcome runPreviews(const GlobalOptions& options, const PreviewsRequest& request)
 {
     QList<QByteArray> named = request.names;
+    // The parser cannot tell studies and folder apart. There is a last value, since one is required.
     const QString folder = pathOf(named.takeLast());
+    // With --all there is the folder alone, without it one study at least.
     if (request.all != named.isEmpty()) {
         LogFile::errorf("Name the studies whose previews to export, or --all");
         return Outcome::WrongUsage;
@@ -40,6 +42,7 @@ Outcome runPreviews(const GlobalOptions& options, const PreviewsRequest& request
         LogFile::errorf("Could not create folder %s", qUtf8Printable(folder));
         return Outcome::Failed;
     }
+    // The previews of studies that are found are exported, also when another study is not.
     bool isDone = chooseStudies(*database, named, request.all, studyUIDs);
     int exported = 0;
     for (const QByteArray& studyUID : qAsConst(studyUIDs)) {
@@ -50,6 +53,7 @@ Outcome runPreviews(const GlobalOptions& options, const PreviewsRequest& request
             isDone = false;
     }
     if (!request.sheet.isEmpty()) {
+        // Of all pictures in the folder, those of earlier runs included.
         const Result result = writeContactSheet(folder, request.sheet);
         isDone = succeeded(result) && isDone;
     }

@@ -13,6 +13,7 @@ namespace
 {
 
 constexpr int kBarWidth = 30;
+// Often enough for the eye, and no cost to the work.
 constexpr std::chrono::milliseconds kRedrawAfter(80);
 
 }  // namespace
@@ -26,6 +27,7 @@ Progress::Progress(const char* what, bool isWanted, Unit unit)
 
 Progress::~Progress()
 {
+    // To the beginning of the line, and clear up to its end.
     if (mIsDrawn)
         std::fprintf(stderr, "\r\033[K");
 }
@@ -40,6 +42,7 @@ void Progress::show(qint64 done, qint64 total)
     const Clock::time_point now = Clock::now();
     if (mFirst < 0)
         mFirst = done;
+    // The last step is drawn in any case.
     if (!mIsDrawn || (now - mLast < kRedrawAfter && done != total))
         return;
     mLast = now;
@@ -47,6 +50,7 @@ void Progress::show(qint64 done, qint64 total)
     const double rate = seconds > 0 ? static_cast<double>(done - mFirst) / seconds : 0;
     const QString rateText = countText(rate) + QStringLiteral("/s");
     const QString doneText = countText(static_cast<double>(done));
+    // Without a total there is neither a share nor an end to foretell.
     if (total <= 0) {
         std::fprintf(stderr, "\r\033[K%s %s  %s", mWhat, qUtf8Printable(doneText), qUtf8Printable(rateText));
         return;

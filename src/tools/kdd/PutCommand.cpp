@@ -41,6 +41,7 @@ Result send(QFile& file, KxCurlUploadStream& stream, Progress& progress)
         stream.abandon();
         return Result::failure(file.errorString());
     }
+    // Only closing tells whether the object is there.
     stream.close();
     return stream.good() ? Result() : Result::failure(QString::fromStdString(stream.error()));
 }
@@ -49,9 +50,11 @@ Result upload(QFile& file, const QByteArray& url, Progress& progress)
 {
     try {
         KxCurlUploadStream stream = KxCurlClient::instance().write(url.toStdString());
+        // Told once, by the caller, with the names of file and object.
         stream.leaveErrorsToCaller();
         return send(file, stream, progress);
     } catch (const std::invalid_argument&) {
+        // Wrong usage, which ends the command with another exit code.
         throw;
     } catch (const std::exception& fault) {
         return Result::failure(QString::fromStdString(explained(fault)));
@@ -67,6 +70,7 @@ Outcome runPut(const GlobalOptions& options, const QString& path, const QByteArr
     }
     Result result;
     try {
+        // Gone, and its line wiped, before a result or a fault is told.
         Progress progress("Uploading", !options.quiet, Progress::Unit::Bytes);
         result = upload(file, url, progress);
     } catch (const std::invalid_argument& fault) {

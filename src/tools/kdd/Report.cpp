@@ -12,6 +12,7 @@ namespace Kdd
 
 void printJson(const QJsonObject& object)
 {
+    // On one line, so that scripts can read line by line.
     const QByteArray text = QJsonDocument(object).toJson(QJsonDocument::Compact);
     std::printf("%s\n", text.constData());
 }
@@ -34,6 +35,7 @@ void printTable(const QList<QStringList>& rows)
         for (int i = 0; i < row.size(); ++i) {
             if (i >= widths.size())
                 widths.append(0);
+            // In characters and not in bytes, so that names in other scripts line up as well.
             widths[i] = qMax(widths.at(i), row.at(i).size());
         }
     }
@@ -41,6 +43,7 @@ void printTable(const QList<QStringList>& rows)
         QString line;
         for (int i = 0; i < row.size(); ++i) {
             const bool isNumber = rows.first().at(i).endsWith(QLatin1Char(' '));
+            // The blank in the heading was only the mark.
             const QString cell = row.at(i).trimmed();
             line += isNumber ? cell.rightJustified(widths.at(i)) : cell.leftJustified(widths.at(i));
             line += QStringLiteral("  ");
@@ -51,6 +54,7 @@ void printTable(const QList<QStringList>& rows)
 
 QString humanBytes(qint64 bytes)
 {
+    // Powers of a thousand, as disks and networks are sold by.
     const char* const units[] = {"B", "KB", "MB", "GB", "TB"};
     auto value = static_cast<double>(bytes);
     int unit = 0;
@@ -65,6 +69,7 @@ QString withoutControls(const QString& text)
 {
     QString shown = text;
     for (QChar& c : shown) {
+        // The upper range as well, for some terminals obey those too.
         if (c < QLatin1Char(' ') || (c >= QChar(0x7f) && c < QChar(0xa0)))
             c = QLatin1Char(' ');
     }

@@ -25,6 +25,7 @@ Outcome runSample(const GlobalOptions& options, const SampleRequest& request)
 {
     SampleSummary summary;
     Result result;
+    // The line of the progress is wiped before anything else is written.
     {
         Progress progress("Writing", !options.quiet);
         result = writeSampleStudies(
@@ -32,6 +33,7 @@ Outcome runSample(const GlobalOptions& options, const SampleRequest& request)
             [&](int done, int total) { progress.show(done, total); }, summary);
     }
     int volumes = 0;
+    // Stacked from the files just written, as an archive would do it.
     if (result.good())
         result = writeSampleVolumes(request.folder, volumes, summary.bytes);
     if (!succeeded(result))

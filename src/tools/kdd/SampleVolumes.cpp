@@ -20,6 +20,7 @@ void addImages(const QDir& seriesFolder, TagFile& file)
 {
     for (const QString& name : seriesFolder.entryList({QStringLiteral("*.dcm")}, QDir::Files, QDir::Name)) {
         const QByteArray path = seriesFolder.filePath(name).toLocal8Bit();
+        // filePathOf finds it there when the stack is written.
         if (TagMap* image = file.addDicomFile(path.constData(), path.constData(), false))
             image->putAndInsertValue(kFilePath, VrCode::LO, path);
     }
@@ -30,6 +31,7 @@ Result stackFolder(const QDir& seriesFolder, int& volumes, qint64& bytes)
     TagFile file;
     addImages(seriesFolder, file);
     for (auto it = file.seriesByUID().cbegin(); it != file.seriesByUID().cend(); ++it) {
+        // A series of several stacks gives as many volumes, and one of none gives none.
         const StackPlan plan = planStacks(*it.value());
         for (int i = 0; i < plan.stacks.size(); ++i) {
             const QString path = seriesFolder.filePath(QString::fromLatin1(volumeFileName(it.key(), i)));

@@ -26,6 +26,7 @@ struct ShowOptions
     bool tree = false;  ///< one line for each node instead of attributes
 };
 
+/// One line: what tells the node from its neighbours, and how many values it holds itself.
 QString describe(const TagMap& node, int depth)
 {
     const QString own = QStringLiteral("  (%1 own)").arg(node.tagsForLevel().size());
@@ -48,6 +49,7 @@ QString describe(const TagMap& node, int depth)
     }
 }
 
+/// Down to `lowest`: 0 is the study, 1 its series, 2 the images.
 void printTree(const TagMap& node, int depth, int lowest)
 {
     std::printf("%*s%s\n", depth * 2, "", qUtf8Printable(describe(node, depth)));
@@ -117,6 +119,7 @@ Outcome runShow(const GlobalOptions& options, const ShowOptions& show)
         printJson(treeOf(*node, depthOf(*node)));
     else if (options.json)
         writeAttributes(*node, show.own);
+    // The images of a whole study are too many to be listed unasked.
     else if (show.tree)
         printTree(*node, depthOf(*node), options.verbose || depthOf(*node) > 0 ? 2 : 1);
     else

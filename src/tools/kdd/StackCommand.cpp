@@ -51,6 +51,7 @@ Outcome runStack(const GlobalOptions& options, const StackRequest& request)
     const bool wantsAll = request.selection.all || request.selection.studies.isEmpty();
     if (database == nullptr)
         return Outcome::Failed;
+    // What is found is stacked, also when another study is not.
     bool isDone = chooseStudies(*database, request.selection.studies, wantsAll, studyUIDs);
     QJsonArray told;
     int volumes = 0;
@@ -60,11 +61,14 @@ Outcome runStack(const GlobalOptions& options, const StackRequest& request)
         *database, {options.volumeFolder(), request.again,
                     request.ignoresFrameOfReference ? FrameOfReference::Ignored : FrameOfReference::Shared});
     for (const QByteArray& studyUID : qAsConst(studyUIDs)) {
+        // Asked between studies, so that none is left half stacked.
         if (progress.isCancelled())
             break;
+        // In this order: a study that fails does not keep the next one from being stacked.
         isDone = stacker.stack(studyUID) && isDone;
         for (const StackedSeries& series : stacker.series()) {
             volumes += series.volumes.size();
+            // Kept until the end, since the result is one value.
             told.append(jsonOf(series));
             if (!options.json && !options.quiet)
                 print(series);

@@ -19,6 +19,7 @@ Outcome runStat(const GlobalOptions& options, const QByteArray& study)
     if (!readStudy(study, file))
         return Outcome::Failed;
     const TagFile::Statistics statistics = file.statistics();
+    // One list for both forms, so that they name the same figures.
     const struct
     {
         const char* name;

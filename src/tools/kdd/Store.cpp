@@ -23,6 +23,7 @@ constexpr int kNamesToTell = 3;
 
 bool resolveStudy(const QByteArray& text, QByteArray& studyUID)
 {
+    // A whole UID needs no database, so that tag files can be looked at without one.
     if (presenceOf(TagFile::cacheFilePathForStudy(text.constData())) != FilePresence::Absent) {
         studyUID = text;
         return true;
@@ -37,6 +38,7 @@ bool resolveStudy(Kxg::Catalogue& database, const QByteArray& text, QByteArray& 
     // Every UID begins with nothing, but whoever names nothing has not chosen a study.
     if (!text.isEmpty() && !succeeded(database.findStudies(text, kNamesToTell, found)))
         return false;
+    // A whole UID means its study, also when longer ones begin with it.
     if (found.size() == 1 || found.contains(text)) {
         studyUID = found.contains(text) ? text : found.first();
         return true;
@@ -61,6 +63,7 @@ bool readStudyFile(const QByteArray& studyUID, TagFile& file)
         return true;
     const QString path = TagFile::cacheFilePathForStudy(studyUID.constData());
     const bool isEmpty = presenceOf(path) == FilePresence::Empty;
+    // Such a file may have been left by a writer that died before it wrote anything.
     const QString reason = isEmpty ? QStringLiteral("it is empty") : file.failure();
     LogFile::errorf("Study %s cannot be read from %s: %s", studyUID.constData(), qUtf8Printable(path),
                     qUtf8Printable(reason));
@@ -71,6 +74,7 @@ bool readTagFile(const QString& path, TagFile& file)
 {
     if (file.readWhenFree(path, nullptr, false))
         return true;
+    // Of these two the reader says nothing itself, because callers know what they mean.
     if (presenceOf(path) == FilePresence::Absent || file.wasLockedOut())
         LogFile::errorf("Could not open %s: %s", qUtf8Printable(path), qUtf8Printable(file.failure()));
     return false;
@@ -78,9 +82,11 @@ bool readTagFile(const QString& path, TagFile& file)
 
 QList<QByteArray> ownPlaces(const GlobalOptions& options)
 {
+    // Folders end in a slash, files do not.
     QList<QByteArray> places = {absolutePath(TagFile::metaFolder()) + '/',
                                 absolutePath(pathBytes(options.volumeFolder())) + '/'};
     const QByteArray address = Kxg::DatabaseServer();
+    // A server keeps its files elsewhere.
     if (address.startsWith("sqlite:")) {
         const QByteArray database = absolutePath(address.mid(7));
         for (const char* suffix : {"", "-wal", "-shm", "-journal", ".claims"})

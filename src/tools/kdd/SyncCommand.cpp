@@ -23,6 +23,7 @@ Outcome runSync(const GlobalOptions& options, const QByteArray& study)
     if (database == nullptr || !resolveStudy(*database, study, studyUID) ||
         !succeeded(StudyChange(*database).synchronise(studyUID, file)))
         return Outcome::Failed;
+    // Counted in the study as it is stored now.
     const TagFile::Statistics statistics = file.statistics();
     if (options.json) {
         printJson(

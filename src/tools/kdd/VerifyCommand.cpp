@@ -18,6 +18,7 @@ namespace
 
 Outcome runVerify(const GlobalOptions& options, const StudySelection& selection)
 {
+    // All studies may take hours, so they are asked for by name.
     if (selection.all != selection.studies.isEmpty()) {
         LogFile::errorf("Name the studies to verify, or --all");
         return Outcome::WrongUsage;
@@ -30,6 +31,7 @@ Outcome runVerify(const GlobalOptions& options, const StudySelection& selection)
     CommandProgress progress("Verifying", !options.quiet);
     StudyCheck check(*database, progress,
                      [](const QString& fault) { LogFile::errorf("%s", qUtf8Printable(fault)); });
+    // Also the tag files of which the database knows nothing.
     if (selection.all)
         check.checkAll();
     for (const QByteArray& studyUID : qAsConst(studyUIDs)) {
@@ -46,6 +48,7 @@ Outcome runVerify(const GlobalOptions& options, const StudySelection& selection)
         std::printf("%d studies, %d images: %d differences, %d unreadable\n", findings.studies,
                     findings.images, findings.differences, findings.unreadable);
     }
+    // Studies that were not reached are not verified, so an interrupt is a failure.
     const QByteArray finished = QByteArray::number(findings.studies) + " studies are verified";
     isDone = !toldOfInterrupt(finished.constData()) && isDone;
     return isDone && findings.differences == 0 && findings.unreadable == 0 ? Outcome::Done : Outcome::Failed;

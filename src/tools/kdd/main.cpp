@@ -44,12 +44,14 @@ Outcome writeFor(const std::string& reader, const CLI::App& app)
 Outcome run(int argc, char** argv)
 {
     CLI::App app(kAbout, "kdd");
+    // The options of the tool may stand behind the command as well.
     app.fallthrough();
     app.formatter(std::make_shared<HelpText>());
     app.footer(kMore);
     GlobalArguments global;
     global.addTo(app);
     std::string reader;
+    // For the build alone; without a group the help does not show it.
     app.add_option("--describe-for", reader)->check(CLI::IsMember({"man", "bash"}))->group("");
     CommandSet::Run chosen;
     CommandSet commands(app, chosen);
@@ -57,8 +59,10 @@ Outcome run(int argc, char** argv)
     try {
         app.parse(argc, argv);
     } catch (const CLI::ParseError& fault) {
+        // Help and version end the parsing like an error, but with 0.
         return app.exit(fault) == 0 ? Outcome::Done : Outcome::WrongUsage;
     }
+    // It comes without a command.
     if (!reader.empty())
         return whenWritten(writeFor(reader, app));
     if (!chosen) {
@@ -66,6 +70,7 @@ Outcome run(int argc, char** argv)
         return Outcome::WrongUsage;
     }
     const GlobalOptions& options = global.apply();
+    // Until here an interrupt simply ends the process.
     CommandProgress::catchInterrupts();
     return whenWritten(chosen(options));
 }
@@ -79,6 +84,7 @@ int main(int argc, char** argv)
     try {
         return static_cast<int>(Kdd::run(argc, argv));
     } catch (const std::exception& fault) {
+        // Whatever nobody reckoned with ends the tool with its reason.
         std::fprintf(stderr, "kdd: %s\n", fault.what());
         return static_cast<int>(Kdd::Outcome::Failed);
     }

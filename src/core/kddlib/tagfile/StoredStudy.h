@@ -44,7 +44,7 @@ public:
     StudyFile& file() { return mFile; }
     const Figures& figures() const { return mFigures; }
 
-    /// Of the file written last; empty before.
+    /// Of the file written last, or read with `readStamped`; empty before.
     const Kxg::TagFileStamp& stamp() const { return mStamp; }
 
     /// Whether the last opening failed because others held the file all the time, or were just making it.
@@ -59,6 +59,9 @@ public:
     /// stays open.
     Result read(const QString& path, const char* studyUID, bool keepOpen, Reader reader);
     Result read(QDataStream& in, const char* studyUID);
+
+    /// The same for others who wait for it, with the stamp of the bytes that were read.
+    Result readStamped(const QString& path, const char* studyUID);
 
     /// Holds the study's file alone and reads it. An absent or empty file holds no study, which is no failure.
     Result hold(const QByteArray& studyUID, IfAbsent ifAbsent);
@@ -76,6 +79,8 @@ public:
     Result merge();
 
 private:
+    Result readThrough(QIODevice& input, const QString& path, const char* studyUID, bool keepOpen,
+                       Reader reader);
     Result readFrom(QDataStream& in, const QString& name, const char* studyUID);
     Result failToOpen(const LockedOpenResult& opened);
     Result open(const QString& path, bool keepOpen, Reader reader);

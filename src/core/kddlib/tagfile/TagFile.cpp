@@ -219,6 +219,11 @@ bool TagFile::readWhenFreeForStudy(const char* studyUID, bool keepOpen)
     return readWhenFree(cacheFilePathForStudy(studyUID), studyUID, keepOpen);
 }
 
+bool TagFile::readStampedWhenFree(const QString& path, const char* studyUID)
+{
+    return d->note(d->study.readStamped(path, studyUID));
+}
+
 bool TagFile::readCacheFile(QDataStream& in, const char* studyUID)
 {
     return d->note(d->study.read(in, studyUID));

@@ -144,6 +144,10 @@ public:
     bool readWhenFree(const QString& path, const char* studyUID, bool keepOpen);
     bool readWhenFreeForStudy(const char* studyUID, bool keepOpen);
 
+    /// The same with the digest of the very bytes that were read: `stamp()` then tells which state of the file the study
+    /// shows, as it does after a write. The file is not kept open.
+    bool readStampedWhenFree(const QString& path, const char* studyUID);
+
     /// Reads from a stream. The object is empty when false is returned.
     bool readCacheFile(QDataStream& in, const char* studyUID);
 
@@ -247,7 +251,7 @@ public:
     /// changed.
     bool syncWithDatabase(const std::shared_ptr<Kxg::DicomDirectoryEntry>& study);
 
-    /// Of the file that this object wrote last; empty before.
+    /// Of the file that this object wrote last, or read with `readStampedWhenFree`; empty before, and when that failed.
     const Kxg::TagFileStamp& stamp() const;
 
     /// Why the last read, write or merge failed, in words; empty after success.

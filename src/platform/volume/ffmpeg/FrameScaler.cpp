@@ -12,6 +12,7 @@ namespace Kdd
 namespace
 {
 
+// Beyond that, in either direction, the claim is a mistake.
 constexpr double kMaxPixelAspect = 16;
 
 // Video of this height and more is coded with the colours of high definition where it does not say which.
@@ -40,6 +41,7 @@ Size fittingSize(const AVFrame& frame, AVRational pixelAspect, const VideoReques
 void setColours(SwsContext* scaler, const AVFrame& frame)
 {
     const AVPixFmtDescriptor* format = av_pix_fmt_desc_get(static_cast<AVPixelFormat>(frame.format));
+    // Red, green and blue need no matrix.
     if (format == nullptr || (format->flags & AV_PIX_FMT_FLAG_RGB) != 0)
         return;
     const int unspecified = frame.height >= kHighDefinitionHeight ? SWS_CS_ITU709 : SWS_CS_ITU601;
@@ -66,6 +68,7 @@ AvHandle<AVFrame> paddedPicture(Size size)
 
 AvHandle<AVFrame> scaled(const AVFrame& frame, Size size)
 {
+    // Areas are averaged, since a picture is only ever made smaller.
     const AvHandle<SwsContext> scaler(sws_getContext(
         frame.width, frame.height, static_cast<AVPixelFormat>(frame.format), size.width, size.height,
         AV_PIX_FMT_RGB24, SWS_AREA | SWS_ACCURATE_RND, nullptr, nullptr, nullptr));
@@ -90,6 +93,7 @@ bool scaleToTarget(const AVFrame& frame, AVRational pixelAspect, VideoRequest& r
     if (out == nullptr)
         return false;
     const auto rowSize = static_cast<size_t>(size.width) * 3;
+    // Row by row, because the picture's rows are padded and the target's are not.
     for (int row = 0; row < size.height; ++row)
         std::memcpy(out + static_cast<size_t>(row) * rowSize,
                     picture->data[0] + ptrdiff_t{row} * picture->linesize[0], rowSize);

@@ -72,6 +72,7 @@ std::string FrameSearch::find(double fraction)
 
 bool FrameSearch::seek(int64_t start)
 {
+    // What the decoder still holds would come out as frames of this attempt.
     avcodec_flush_buffers(mDecoder.get());
     av_frame_unref(mFound.get());
     mPlace = mByTime ? start : std::max<int64_t>(start, 0);
@@ -106,6 +107,7 @@ void FrameSearch::notePlace()
 
 bool FrameSearch::decodeFrom(int64_t start, Begin begin)
 {
+    // The last attempt takes whatever comes, also from where the input stands now.
     if (!seek(start) && begin != Begin::AnyPacket)
         return false;
     bool begun = false;
@@ -116,6 +118,7 @@ bool FrameSearch::decodeFrom(int64_t start, Begin begin)
         begun = begun || mayBegin(begin);
         if (begun)
             step = feed(mPacket.get());
+        // The place is passed without a key frame before it: the next attempt begins further back.
         else if (begin == Begin::KeyBeforePlace && mPlace > mWanted)
             return false;
     }
@@ -130,6 +133,7 @@ FrameSearch::Step FrameSearch::feed(const AVPacket* packet)
     // A damaged packet is passed over; the decoder goes on with the next one.
     if (avcodec_send_packet(mDecoder.get(), packet) < 0)
         return Step::More;
+    // Also for a packet that gives no frame, since it cost the work all the same.
     mPixelsLeft -= int64_t{mDecoder->width} * mDecoder->height;
     Step step = Step::Found;
     while ((step = take()) == Step::More) {
@@ -142,6 +146,7 @@ FrameSearch::Step FrameSearch::take()
     if (avcodec_receive_frame(mDecoder.get(), mFrame.get()) < 0)
         return Step::End;
     const int64_t place = mByTime ? mFrame->best_effort_timestamp : mFrame->pts;
+    // A frame before the place is kept in case none comes after it.
     av_frame_unref(mFound.get());
     av_frame_move_ref(mFound.get(), mFrame.get());
     return place == AV_NOPTS_VALUE || place >= mWanted ? Step::Found : Step::More;

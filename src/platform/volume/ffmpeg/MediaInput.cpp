@@ -61,9 +61,11 @@ int MediaInput::readBytes(void* self, uint8_t* out, int length)
     const int64_t wanted = std::min<int64_t>(length, input.mRequest.size - input.mPosition);
     if (wanted <= 0)
         return AVERROR_EOF;
+    // All reads count, because seeking back reads the same bytes again.
     if (wanted > input.mBytesLeft)
         return AVERROR(EIO);
     const int64_t got = input.mRequest.read(input.mRequest.source, input.mPosition, out, wanted);
+    // More than was asked for would be beyond the room that there is.
     if (got <= 0 || got > wanted)
         return got == 0 ? AVERROR_EOF : AVERROR(EIO);
     input.mPosition += got;
@@ -89,6 +91,7 @@ bool MediaInput::prepare()
     if (buffer == nullptr)
         return false;
     mBytes.reset(avio_alloc_context(buffer, kBufferSize, 0, this, &readBytes, nullptr, &seekBytes));
+    // Nobody owns the buffer yet.
     if (mBytes == nullptr) {
         av_free(buffer);
         return false;
@@ -131,6 +134,7 @@ bool MediaInput::findStream()
             mStream = i;
             found = true;
         } else {
+            // Its packets are dropped before they cost anything.
             candidate.discard = AVDISCARD_ALL;
         }
     }

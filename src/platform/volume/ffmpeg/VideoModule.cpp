@@ -39,6 +39,7 @@ extern "C" KDD_EXPORT std::int32_t kddDecodeVideoFrame(Kdd::VideoRequest* reques
 
 std::int32_t kddDecodeVideoFrame(Kdd::VideoRequest* request)
 {
+    // A structure of another version: nothing but its first number can be relied upon.
     if (request->version != Kdd::kVideoModuleVersion)
         return 0;
     std::string reason;

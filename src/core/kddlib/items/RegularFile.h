@@ -1,0 +1,22 @@
+#pragma once
+
+#include "platform/base/Export.h"
+#include "platform/base/Result.h"
+
+#include <QByteArray>
+
+class DcmFileFormat;
+
+namespace Kdd
+{
+
+/// A DICOM file of any form that the library reads, local or behind a URL, as the bytes of one with preamble and meta
+/// header, in little endian and not deflated as a whole. Compressed pixels stay as they are.
+///
+/// Fails when the file cannot be read, and for one that takes more than 512 MiB in either form: all of it is in memory.
+KDD_EXPORT Result readAsRegularFile(const QByteArray& path, QByteArray& bytes);
+
+/// The bytes of a DICOM file of a dataset that has the transfer syntax (by number, as DCMTK has them) already.
+Result writeDicomBytes(DcmFileFormat& file, int syntax, QByteArray& bytes);
+
+}  // namespace Kdd

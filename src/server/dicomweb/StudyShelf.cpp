@@ -1,0 +1,282 @@
+#include "server/dicomweb/StudyShelf.h"
+
+#include "server/dicomweb/ResourcePath.h"
+
+#include <QHash>
+
+#include <fcntl.h>
+#include <kddlib/PathName.h>
+#include <kddlib/TagFileStamp.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <chrono>
+#include <list>
+
+namespace Kdd::DicomWeb
+{
+namespace
+{
+
+using Clock = std::chrono::steady_clock;
+
+// Of studies whose tree had to go the version is kept on: some 300 bytes each, and whoever has an answer of that version
+// needs no tree.
+constexpr int kMaxEntries = 10000;
+
+qint64 nanoseconds(const timespec& time)
+{
+    return qint64(time.tv_sec) * 1'000'000'000 + time.tv_nsec;
+}
+
+/// What a file system tells of a file without its content.
+struct FileState
+{
+    int error = ENOENT;  // errno of the attempt to look
+    quint64 device = 0;
+    quint64 inode = 0;
+    qint64 size = 0;      // [bytes]
+    qint64 modified = 0;  // [ns]
+    qint64 changed = 0;   // [ns]; no program can set this one back
+    qint64 age = 0;       // [ns] since the later of the two; negative when the clock was set back
+
+    bool isAbsent() const { return error == ENOENT || error == ENOTDIR; }
+    bool equals(const FileState& other) const
+    {
+        return error == 0 && other.error == 0 && device == other.device && inode == other.inode &&
+               size == other.size && modified == other.modified && changed == other.changed;
+    }
+};
+
+/// Opens the file to look at it: a network file system answers a mere question from memory, but asks its server at every
+/// opening.
+FileState stateOf(const QByteArray& path)
+{
+    FileState state;
+    const int file = ::open(path.constData(), O_RDONLY | O_CLOEXEC | O_NONBLOCK);
+    struct stat found = {};
+    timespec now = {};
+    state.error =
+        file >= 0 && ::fstat(file, &found) == 0 && ::clock_gettime(CLOCK_REALTIME, &now) == 0 ? 0 : errno;
+    if (file >= 0)
+        ::close(file);
+    if (state.error != 0)
+        return state;
+    state.device = found.st_dev;
+    state.inode = found.st_ino;
+    state.size = found.st_size;
+    state.modified = nanoseconds(found.st_mtim);
+    state.changed = nanoseconds(found.st_ctim);
+    state.age = nanoseconds(now) - qMax(state.modified, state.changed);
+    return state;
+}
+
+/// Whether a writer stands in the middle of the file, or died there: it is for the reader to wait or to finish it.
+bool hasJournal(const QByteArray& path)
+{
+    struct stat found = {};
+    return ::lstat((path + ".journal").constData(), &found) == 0;
+}
+
+struct Entry
+{
+    std::mutex reading;  // one reads, others who want this study wait for it
+    // Guarded by `reading`:
+    Presence presence = Presence::Absent;
+    QByteArray version;
+    FileState state;              // as it was when it was read
+    Clock::time_point readSince;  // when that reading began
+
+    // Guarded by the shelf:
+    std::shared_ptr<const ServedStudy> study;
+    qint64 weight = 0;
+    std::list<QByteArray>::iterator place;
+};
+
+}  // namespace
+
+struct StudyShelf::Private
+{
+    std::shared_ptr<Entry> obtain(const QByteArray& uid);
+    std::shared_ptr<const ServedStudy> studyOf(const Entry& entry);
+    void put(Entry& entry, const std::shared_ptr<const ServedStudy>& study, qint64 weight);
+    void forget(const QByteArray& uid);
+    void trim();
+
+    bool isCurrent(Entry& entry, const QByteArray& path, Clock::time_point asked, bool needsTree);
+    void read(Entry& entry, const QByteArray& uid, const QString& path);
+    Presence look(const QByteArray& uid, QByteArray& version, std::shared_ptr<const ServedStudy>* study);
+
+    std::mutex mutex;
+    QHash<QByteArray, std::shared_ptr<Entry>> entries;
+    std::list<QByteArray> order;  // the study looked up last comes first
+    qint64 capacity = 0;
+    qint64 settledAge = 0;  // [ns]
+    qint64 used = 0;
+};
+
+std::shared_ptr<Entry> StudyShelf::Private::obtain(const QByteArray& uid)
+{
+    const std::lock_guard<std::mutex> lock(mutex);
+    std::shared_ptr<Entry>& entry = entries[uid];
+    if (entry == nullptr) {
+        entry = std::make_shared<Entry>();
+        order.push_front(uid);
+    } else {
+        order.splice(order.begin(), order, entry->place);
+    }
+    entry->place = order.begin();
+    return entry;
+}
+
+std::shared_ptr<const ServedStudy> StudyShelf::Private::studyOf(const Entry& entry)
+{
+    const std::lock_guard<std::mutex> lock(mutex);
+    return entry.study;
+}
+
+/// In place of what is there; null lets go of it.
+void StudyShelf::Private::put(Entry& entry, const std::shared_ptr<const ServedStudy>& study, qint64 weight)
+{
+    std::shared_ptr<const ServedStudy> former = study;  // deleted outside of the lock
+    const std::lock_guard<std::mutex> lock(mutex);
+    used += weight - entry.weight;
+    entry.study.swap(former);
+    entry.weight = weight;
+}
+
+/// Of a study that is not there nothing is kept: anybody may ask for any number of those.
+void StudyShelf::Private::forget(const QByteArray& uid)
+{
+    const std::lock_guard<std::mutex> lock(mutex);
+    const auto found = entries.find(uid);
+    // Whoever waits for it holds it too, and forgets it in turn.
+    if (found == entries.end() || found.value().use_count() > 2)
+        return;
+    order.erase(found.value()->place);
+    entries.erase(found);
+}
+
+void StudyShelf::Private::trim()
+{
+    std::vector<std::shared_ptr<const ServedStudy>> gone;  // deleted outside of the lock
+    const std::lock_guard<std::mutex> lock(mutex);
+    const qint64 kept = order.empty() ? 0 : entries[order.front()]->weight;
+    for (auto at = order.end(); used > capacity && used > kept && at != order.begin();) {
+        --at;
+        Entry& entry = *entries[*at];
+        if (at == order.begin())
+            break;
+        gone.push_back(std::move(entry.study));
+        used -= entry.weight;
+        entry.study.reset();
+        entry.weight = 0;
+    }
+    for (auto at = order.end(); entries.size() > kMaxEntries && at != order.begin();) {
+        --at;
+        const auto found = entries.find(*at);
+        if (found.value().use_count() > 1)
+            continue;
+        used -= found.value()->weight;
+        gone.push_back(std::move(found.value()->study));
+        entries.erase(found);
+        at = order.erase(at);
+    }
+}
+
+/// Whether what the entry knows is what the file says now, or said after it was asked for.
+bool StudyShelf::Private::isCurrent(Entry& entry, const QByteArray& path, Clock::time_point asked,
+                                    bool needsTree)
+{
+    if (entry.presence == Presence::Found && needsTree && studyOf(entry) == nullptr)
+        return false;
+    // Others began to read after this one asked: whatever was written before that they have seen.
+    if (entry.readSince > asked)
+        return true;
+    // The file before its journal: a writer that comes in between was not yet there when the file was looked at.
+    return entry.state.age > settledAge && entry.state.equals(stateOf(path)) && !hasJournal(path);
+}
+
+void StudyShelf::Private::read(Entry& entry, const QByteArray& uid, const QString& path)
+{
+    const QByteArray name = pathBytes(path);
+    entry.readSince = Clock::now();
+    entry.state = {};
+    const FileState before = stateOf(name);
+    auto file = std::make_unique<TagFile>();
+    if (before.isAbsent()) {
+        entry.presence = Presence::Absent;
+    } else if (file->readStampedWhenFree(path, uid.constData())) {
+        const QByteArray version = file->stamp().digest.toHex();
+        entry.state = before.equals(stateOf(name)) ? before : FileState();
+        entry.presence = Presence::Found;
+        // The tree that is there is as good, and others may hold it.
+        if (version == entry.version && studyOf(entry) != nullptr)
+            return;
+        entry.version = version;
+        const qint64 weight = file->statistics().uncompressedSize;
+        put(entry, std::make_shared<const ServedStudy>(std::move(file), version), weight);
+        return;
+    } else if (stateOf(name).isAbsent()) {
+        entry.presence = Presence::Absent;
+    } else if (file->wasLockedOut()) {
+        entry.presence = Presence::Held;
+        return;
+    } else {
+        entry.state = before.equals(stateOf(name)) ? before : FileState();
+        entry.presence = Presence::Damaged;
+    }
+    entry.version.clear();
+    put(entry, nullptr, 0);
+}
+
+Presence StudyShelf::Private::look(const QByteArray& uid, QByteArray& version,
+                                   std::shared_ptr<const ServedStudy>* study)
+{
+    version.clear();
+    if (!isUID(uid))
+        return Presence::Absent;
+    const Clock::time_point asked = Clock::now();
+    const QString path = TagFile::cacheFilePathForStudy(uid.constData());
+    const std::shared_ptr<Entry> entry = obtain(uid);
+    Presence presence = Presence::Absent;
+    {
+        const std::lock_guard<std::mutex> lock(entry->reading);
+        if (!isCurrent(*entry, pathBytes(path), asked, study != nullptr))
+            read(*entry, uid, path);
+        presence = entry->presence;
+        if (presence == Presence::Found) {
+            version = entry->version;
+            if (study != nullptr)
+                *study = studyOf(*entry);
+        }
+    }
+    if (presence == Presence::Absent)
+        forget(uid);
+    trim();
+    return presence;
+}
+
+StudyShelf::StudyShelf(qint64 capacity, std::chrono::nanoseconds settledAge)
+    : d(std::make_unique<Private>())
+{
+    d->capacity = capacity;
+    d->settledAge = settledAge.count();
+}
+
+StudyShelf::~StudyShelf() = default;
+
+Presence StudyShelf::find(const QByteArray& studyUID, std::shared_ptr<const ServedStudy>& study)
+{
+    study.reset();
+    QByteArray version;
+    return d->look(studyUID, version, &study);
+}
+
+Presence StudyShelf::version(const QByteArray& studyUID, QByteArray& version)
+{
+    return d->look(studyUID, version, nullptr);
+}
+
+}  // namespace Kdd::DicomWeb
