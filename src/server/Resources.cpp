@@ -9,9 +9,8 @@
 #include "server/dicomweb/search/ChangeFeed.h"
 #include "server/dicomweb/search/SearchResource.h"
 
-#include <QFile>
-
 #include <kddlib/ExResource.h>
+#include <kddlib/PathName.h>
 #include <kddlib/TagFile.h>
 
 namespace Kdd
@@ -21,9 +20,8 @@ namespace
 
 QString answersFolder()
 {
-    const QByteArray folder = ExResource::answersFolder();
-    return folder.isEmpty() ? QFile::decodeName(TagFile::metaFolder()) + QStringLiteral("/answers")
-                            : QFile::decodeName(folder);
+    const QByteArray configured = ExResource::answersFolder();
+    return pathText(configured.isEmpty() ? TagFile::metaFolder() + QByteArray("answers") : configured);
 }
 
 }  // namespace
