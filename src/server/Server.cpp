@@ -59,8 +59,8 @@ int affordableConnections(int wanted)
     const auto descriptors = static_cast<qint64>(std::min<rlim_t>(limit.rlim_cur, 10'000'000));
     const auto most = static_cast<int>(std::max<qint64>(1, (descriptors - kOtherDescriptors) / 2));
     if (wanted > most)
-        LogFile::warnf("The system allows %d connections, not %d: it gives this process %lld descriptors",
-                       most, wanted, static_cast<long long>(descriptors));
+        LogFile::printf("The system allows %d connections, not %d: it gives this process %lld descriptors",
+                        most, wanted, static_cast<long long>(descriptors));
     return std::min(wanted, most);
 }
 

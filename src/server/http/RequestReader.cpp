@@ -93,8 +93,10 @@ RequestReader::State RequestReader::advance()
         return State::Refused;
     if (!d->parser) {
         // Empty lines before a request are from clients that end a body with one.
-        while (d->unread.startsWith("\r\n"))
-            d->unread.remove(0, 2);
+        int blank = 0;
+        while (d->unread.mid(blank, 2) == "\r\n")
+            blank += 2;
+        d->unread.remove(0, blank);
         if (d->unread.isEmpty())
             return State::Between;
         d->parser.emplace();

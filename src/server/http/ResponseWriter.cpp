@@ -6,6 +6,7 @@
 #include <cstdio>
 #include <cstring>
 #include <ctime>
+#include <exception>
 
 namespace Kdd::Http
 {
@@ -267,7 +268,12 @@ void ResponseWriter::frame()
 
 bool ResponseWriter::prepareBlock(Producer& producer)
 {
-    const Result made = producer.next(mBlock);
+    Result made;
+    try {
+        made = producer.next(mBlock);
+    } catch (const std::exception& fault) {
+        made = Result::failure(QString::fromLocal8Bit(fault.what()));
+    }
     mFault = made.text();
     if (made.good() && mBlock.isEmpty())
         ++mPart;

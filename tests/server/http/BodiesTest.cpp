@@ -169,18 +169,28 @@ TEST_F(HttpBodies, OfAFileThatIsCutEndEarlyWithoutOtherBytes)
 
 TEST_F(HttpBodies, ThatCannotBeMadeEndEarly)
 {
-    RunningServer server([](const Http::Request&) {
+    struct Throwing : Http::Producer
+    {
+        Result next(QByteArray&) override { throw std::runtime_error("there is no more"); }
+    };
+    RunningServer server([](const Http::Request& request) {
         Http::Response response(200);
         response.body.emplace_back(std::make_unique<Blocks>(0));
-        response.body.emplace_back(std::make_unique<Blocks>(-1));
+        if (request.path.value(0) == "throw")
+            response.body.emplace_back(std::make_unique<Throwing>());
+        else
+            response.body.emplace_back(std::make_unique<Blocks>(-1));
         return response;
     });
-    Client client(server.address());
-    client.get("/");
-    const Reply reply = client.reply();
-    EXPECT_EQ(reply.status, 200);
-    EXPECT_FALSE(reply.isWhole);
-    EXPECT_EQ(server.exchanges(1)[0].fault, QStringLiteral("there is no more"));
+    std::size_t count = 0;
+    for (const char* path : {"/fail", "/throw"}) {
+        Client client(server.address());
+        client.get(path);
+        const Reply reply = client.reply();
+        EXPECT_EQ(reply.status, 200);
+        EXPECT_FALSE(reply.isWhole);
+        EXPECT_EQ(server.exchanges(++count).back().fault, QStringLiteral("there is no more"));
+    }
 }
 
 TEST_F(HttpBodies, AndHeadersThatCannotBeSentAreReplaced)
