@@ -3,6 +3,9 @@
 #include "server/dicomweb/Resource.h"
 #include "server/dicomweb/StudyShelf.h"
 #include "server/dicomweb/retrieve/ObjectShelf.h"
+#include "server/dicomweb/search/ThreadSearch.h"
+
+#include <kddlib/Kxg.h>
 
 #include <memory>
 #include <vector>
@@ -15,6 +18,7 @@ struct ServedArchive
 {
     DicomWeb::StudyShelf studies{64 * 1024 * 1024};
     DicomWeb::ObjectShelf objects{16 * 1024 * 1024};
+    DicomWeb::ThreadSearch database{Kxg::DatabaseServer()};
 };
 
 /// All that answers below the prefix of DICOMweb, in the order in which they are asked whether a path is theirs. The

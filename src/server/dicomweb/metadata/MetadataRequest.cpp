@@ -2,6 +2,7 @@
 
 #include "server/http/AcceptHeader.h"
 
+#include <QList>
 #include <QCryptographicHash>
 #include <QList>
 
