@@ -33,14 +33,14 @@ std::vector<std::unique_ptr<DicomWeb::Resource>> makeResources(ServedArchive& ar
     std::vector<std::unique_ptr<Resource>> resources;
     // Viewers ask for frames nine times of ten.
     resources.push_back(std::make_unique<FramesResource>(archive.studies, archive.objects));
-    resources.push_back(std::make_unique<MetadataResource>(archive.studies, answersFolder(),
+    resources.push_back(std::make_unique<MetadataResource>(*archive.studies, answersFolder(),
                                                            qint64(ExResource::answersSize()) * 1024 * 1024));
-    resources.push_back(std::make_unique<SearchResource>(archive.database, archive.studies));
+    resources.push_back(std::make_unique<SearchResource>(archive.database, *archive.studies));
     resources.push_back(std::make_unique<ChangeFeed>(archive.database));
     resources.push_back(std::make_unique<InstancesResource>(archive.studies, archive.objects));
     resources.push_back(std::make_unique<BulkDataResource>(archive.studies, archive.objects));
-    resources.push_back(std::make_unique<ThumbnailResource>(archive.studies));
-    resources.push_back(std::make_unique<RenderedResource>(archive.studies));
+    resources.push_back(std::make_unique<ThumbnailResource>(*archive.studies));
+    resources.push_back(std::make_unique<RenderedResource>(*archive.studies));
     return resources;
 }
 

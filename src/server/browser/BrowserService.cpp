@@ -28,7 +28,6 @@ constexpr const char* kPolicy =
 void addSafety(Http::Response& response)
 {
     response.addHeader("Content-Security-Policy", kPolicy);
-    response.addHeader("X-Content-Type-Options", "nosniff");
     response.addHeader("Referrer-Policy", "no-referrer");
     response.addHeader("Cross-Origin-Resource-Policy", "same-origin");
     response.addHeader("X-Frame-Options", "DENY");

@@ -85,7 +85,6 @@ TEST_F(BrowserTest, LetsNothingOfAnAnswerBeTakenForAScript)
         EXPECT_EQ(response.status, 200) << target;
         EXPECT_FALSE(policy.contains("unsafe") || policy.contains("*")) << policy.constData();
         EXPECT_TRUE(policy.contains("frame-ancestors 'none'")) << policy.constData();
-        EXPECT_EQ(header(response, "X-Content-Type-Options"), "nosniff") << target;
         EXPECT_EQ(header(response, "Referrer-Policy"), "no-referrer") << target;
     }
     EXPECT_FALSE(bodyOf(get("/")).contains("<script>") || bodyOf(get("/")).contains("style="));

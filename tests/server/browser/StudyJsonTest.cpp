@@ -16,7 +16,7 @@ QString attributesOf(const QString& tag, const QJsonObject& tree)
     for (const QJsonValue& one : tree[QStringLiteral("attributes")].toArray())
         if (one[QStringLiteral("tag")] == tag)
             return one[QStringLiteral("origin")].toString() +
-                   (one[QStringLiteral("hidden")].toBool() ? " hidden" : "");
+                   QLatin1String(one[QStringLiteral("hidden")].toBool() ? " hidden" : "");
     return QStringLiteral("none");
 }
 
@@ -59,7 +59,7 @@ struct Origin
 };
 
 const Origin kOrigins[] = {
-    {"1.4.1", "00100010", "study"}, {"1.4.1", "0008103E", "series"},       {"1.4.1", "00200013", "image"},
+    {"1.4.1", "00100010", "study"}, {"1.4.4", "0008103E", "series"},       {"1.4.2", "00200013", "image"},
     {"1.4.1", "00081030", "study"}, {"1.4.5", "00081030", "image hidden"}, {"1.4.1", "00080018", "image"},
     {"1.4.1", "00104000", "none"},  {"1.4.1", "00067100", "none"},
 };
@@ -190,7 +190,7 @@ TEST_F(BrowserTest, TellsAVolumesGeometryInMillimetres)
     file.addVolumeInfo({&info});
     ASSERT_TRUE(file.writeCacheFile());
     const QJsonValue volume =
-        json("/browser/studies/1.2")[QStringLiteral("series")][0][QStringLiteral("volumes")][0];
+        QJsonValue(json("/browser/studies/1.2"))[QStringLiteral("series")][0][QStringLiteral("volumes")][0];
     EXPECT_EQ(volume[QStringLiteral("dims")].toArray(), (QJsonArray{512, 256, 2}));
     EXPECT_EQ(volume[QStringLiteral("spacing")].toArray(), (QJsonArray{0.5, 0.25, 2}));
     EXPECT_EQ(volume[QStringLiteral("origin")].toArray(), (QJsonArray{-10, -20, 30}));

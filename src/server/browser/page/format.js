@@ -16,8 +16,8 @@ export function first(object, tag) {
 export function personName(name) {
   const groups = typeof name === 'object' && name !== null ? [name.Alphabetic, name.Ideographic, name.Phonetic]
     : String(name ?? '').split('=');
-  const [latin, ...others] = groups.map((group) =>
-    String(group ?? '').split('^').map((one) => one.trim()).filter(Boolean).join(', '));
+  const [latin, ...others] = groups.map((group, i) =>
+    String(group ?? '').split('^').map((one) => one.trim()).filter(Boolean).join(i === 0 ? ', ' : ' '));
   const known = others.filter(Boolean);
   if (!latin) return known.join(' · ');
   return known.length > 0 ? `${latin} (${known.join(' · ')})` : latin;
@@ -70,7 +70,8 @@ export function number(value, digits = 4) {
 
 /** "StudyInstanceUID" as "Study Instance UID". */
 export function spaced(keyword) {
-  return keyword.replace(/([a-z0-9])([A-Z])/g, '$1 $2').replace(/([A-Z]+)([A-Z][a-z])/g, '$1 $2');
+  return keyword.replace(/([a-z0-9])([A-Z])/g, '$1 $2').replace(/([A-Z]+)([A-Z][a-z])/g, '$1 $2')
+    .replace('X Ray', 'X-Ray').replace('CTD Ivol', 'CTDIvol');
 }
 
 /** "00100010" as "(0010,0010)". */

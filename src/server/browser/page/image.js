@@ -24,7 +24,8 @@ function aside(study, series, image) {
       h('span', {}, `${image.position + 1} of ${image.count}`), stepButton(uid, image.next, 'right', 'Next image')),
     h('dl', { class: 'facts' },
       h('dt', {}, 'Series'), h('dd', { class: 'value' }, series ? seriesName(series) : image.series),
-      h('dt', {}, 'Held by'), h('dd', {}, `study ${image.own.study}, series ${image.own.series}, image ${image.own.image}`)),
+      image.image.frames > 1 && [h('dt', {}, 'Frames'), h('dd', {}, image.image.frames)]),
+    h('p', { class: 'soft' }, `The study holds ${amount(image.own.study, 'value')}, the series ${image.own.series} and the image ${image.own.image}.`),
     other && h('a', { class: 'button', href: studyLink(uid, `/difference?a=${encodeURIComponent(image.key)}&b=${encodeURIComponent(other)}`) },
       icon('compare'), 'Compare with another'));
 }

@@ -22,7 +22,7 @@ export function roving(container, selector, step) {
     next.scrollIntoView({ block: 'nearest', inline: 'nearest' });
   });
   container.addEventListener('focusin', (event) => event.target.matches(selector) && choose(event.target));
-  return { choose, refresh: () => !container.querySelector(`${selector}[tabindex="0"]`) && choose(all()[0]) };
+  return { choose, refresh: () => !container.querySelector(`:is(${selector})[tabindex="0"]`) && choose(all()[0]) };
 }
 
 export const vertical = (key) => ({ ArrowDown: 1, ArrowUp: -1, PageDown: 10, PageUp: -10 })[key];

@@ -10,10 +10,11 @@ const stripSize = 200;
 export const studyLink = (study, rest = '') => `#/studies/${encodeURIComponent(study)}${rest}`;
 export const imageLink = (study, image) => studyLink(study, `/images/${encodeURIComponent(image)}`);
 
-/** "2 · T1 axial": what tells a series from its neighbours. */
+/** "2 T1 axial": what tells a series from its neighbours. */
 export function seriesName(series) {
   const told = series.attributes;
-  return [told.SeriesNumber, series.label || told.SeriesDescription || told.ProtocolName || 'Series'].filter(Boolean).join(' · ');
+  // A label begins with the number already.
+  return series.label || [told.SeriesNumber, told.SeriesDescription || told.ProtocolName || 'Series'].filter(Boolean).join(' ');
 }
 
 export function trail(...steps) {
@@ -81,11 +82,17 @@ function sizesPanel(study, sizes) {
     size('of which previews', previews, whole, ''));
 }
 
-export function tile(study, series, image) {
+/** Of an image without a picture only the number, in less room. */
+function tile(study, series, image) {
   const name = image.number || '–';
-  return h('a', { class: 'tile', href: imageLink(study, image.key), tabindex: -1, 'aria-label': `Image ${name}` },
-    picture(addresses.imagePreview(study, series, image), '', image.pixels ? name : 'no picture'),
-    image.frames > 1 ? `${name} · ${image.frames} frames` : name);
+  const address = addresses.imagePreview(study, series, image);
+  return h('a', { class: address ? 'tile' : 'tile bare', href: imageLink(study, image.key), tabindex: -1, 'aria-label': `Image ${name}` },
+    address ? [picture(address, ''), image.frames > 1 ? `${name} · ${image.frames} frames` : name] : picture(null, '', name));
+}
+
+function volumeTile(study, series, volume) {
+  return h('a', { class: 'tile', href: studyLink(study, '/volumes'), tabindex: -1 },
+    picture(addresses.volumePreview(study, series.key, volume.index), ''), 'Volume');
 }
 
 /** The pictures of a series, asked for when it comes into view. */
@@ -103,14 +110,15 @@ class Strip {
   async load() {
     try {
       const list = await getImages(this.study, this.series.key, this.shown, stripSize, this.view.signal);
-      if (this.shown === 0) this.element.replaceChildren();
+      if (this.shown === 0) this.element.replaceChildren(...this.series.volumes.filter((one) => one.preview).map((one) => volumeTile(this.study, this.series, one)));
       this.element.querySelector('button')?.remove();
       this.element.append(...list.images.map((image) => tile(this.study, this.series.key, image)));
+      const [firstNew] = [...this.element.children].slice(-list.images.length);
       const had = this.shown;
       this.shown += list.images.length;
       if (this.shown < list.count && list.images.length > 0) this.element.append(this.more(list.count - this.shown));
       this.keys.refresh();
-      if (had > 0) this.element.children[had]?.focus();
+      if (had > 0) firstNew?.focus();
     } catch (fault) {
       if (fault.kind !== 'gone') this.element.replaceChildren(h('p', { class: 'note' }, fault.message));
     }
@@ -128,7 +136,7 @@ function seriesPanel(study, series, strip) {
   return h('section', { class: 'panel series', 'aria-label': `Series ${seriesName(series)}` },
     h('div', { class: 'about' },
       h('h2', {}, told.Modality && h('span', { class: 'badge' }, told.Modality), h('span', { class: 'value' }, seriesName(series))),
-      told.SeriesDescription && told.SeriesDescription !== series.label && h('p', { class: 'value' }, told.SeriesDescription),
+      told.SeriesDescription && !seriesName(series).endsWith(told.SeriesDescription) && h('p', { class: 'value' }, told.SeriesDescription),
       h('p', { class: 'soft' }, [amount(series.images, 'image'), volumes > 0 && amount(volumes, 'volume'),
         time(told.SeriesTime)].filter(Boolean).join(' · ')),
       h('p', { class: 'soft value' }, [told.BodyPartExamined, told.ManufacturerModelName].filter(Boolean).join(' · ')),

@@ -143,7 +143,7 @@ export class AttributeTree {
 
   value(attribute) {
     const note = (words) => h('span', { class: 'soft' }, words);
-    if (attribute.hidden) return note('not here, although a node above has it');
+    if (attribute.hidden) return note(`not in this ${attribute.origin}, although a node above has it`);
     if (attribute.omitted) return note('too long for the tag file; in the DICOM file');
     if (attribute.items) return note(amount(attribute.count, 'item'));
     if (attribute.value === '') return note('empty');
