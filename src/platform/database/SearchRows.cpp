@@ -2,7 +2,6 @@
 
 #include "platform/database/SearchText.h"
 #include "platform/database/SqlConnection.h"
-#include "platform/database/SqlDialect.h"
 
 #include <QJsonArray>
 #include <QJsonDocument>
@@ -95,10 +94,8 @@ void put(SqlConnection& connection, qint64 studyId, const StudySearchRecord& stu
         return;
     connection.change("INSERT INTO study_answer (study_id, attributes) VALUES (?, ?)",
                       {studyId, bytesValue(study.attributes)});
-    const SqlDialect& dialect = SqlDialect::of(connection.address().engine);
-    connection.change("INSERT INTO study_words (" + dialect.wordsKey.toLatin1() +
-                          ", patient_name, referring_physician, description, patient_id, accession_number,"
-                          " study_code) VALUES (?, ?, ?, ?, ?, ?, ?)",
+    connection.change("INSERT INTO study_words (study_id, patient_name, referring_physician, description, patient_id,"
+                      " accession_number, study_code) VALUES (?, ?, ?, ?, ?, ?, ?)",
                       {studyId, textValue(names(study.patientName)), textValue(names(study.referringPhysician)),
                        textValue(words(study.description)), textValue(words(study.patientID)),
                        textValue(words(study.accessionNumber)), textValue(words(study.studyID))});
@@ -251,9 +248,8 @@ void putRegisteredRows(SqlConnection& connection, qint64 studyId)
 
 void removeSearchRows(SqlConnection& connection, qint64 studyId)
 {
-    // What hangs below goes with it; the engine's own table of words knows no such tie.
-    const QByteArray key = SqlDialect::of(connection.address().engine).wordsKey.toLatin1();
-    connection.change("DELETE FROM study_words WHERE " + key + " = ?", {studyId});
+    // What hangs below goes with it, but for the words: of what goes that way the index of parts is not told.
+    connection.change("DELETE FROM study_words WHERE study_id = ?", {studyId});
     connection.change("DELETE FROM study_search WHERE study_id = ?", {studyId});
 }
 

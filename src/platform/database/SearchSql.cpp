@@ -81,12 +81,19 @@ QByteArray longestPart(const QByteArray& pattern)
     return longest;
 }
 
+/// What is in a column, as the index of parts is asked for it.
+QByteArray phrase(const QByteArray& column, QByteArray part)
+{
+    return column + " : \"" + part.replace('"', "\"\"") + '"';
+}
+
 /// Conditions are collected here, and what they are bound to in the same order.
 class Conditions
 {
 public:
-    explicit Conditions(const SqlDialect& dialect)
+    Conditions(const SqlDialect& dialect, const QSet<QByteArray>& frequent)
         : mDialect(dialect)
+        , mFrequent(frequent)
     {
     }
 
@@ -161,22 +168,20 @@ private:
 
     void addWords(SearchSql& sql, const QByteArray& column, const QByteArray& pattern)
     {
-        const QByteArray key = mDialect.wordsKey.toLatin1();
-        const QByteArray part = longestPart(pattern);
-        const bool isPart = pattern == '*' + part + '*';
-        const QByteArray list = "s.study_id IN (SELECT " + key + " FROM study_words WHERE ";
-        if (!mDialect.hasMatchIndex || part.size() < kIndexedPart) {
-            append(sql, list + matches(column) + ')', {textValue(mDialect.pattern(pattern))});
+        const QVariant whole = textValue(mDialect.pattern(pattern));
+        if (mFrequent.contains(pattern)) {
+            append(sql, matches("(SELECT w." + column + " FROM study_words w WHERE w.study_id = s.study_id)"), {whole});
             return;
         }
-        QByteArray quoted = part;
-        quoted.replace('"', "\"\"");
-        const QVariant phrase = textValue(column + " : \"" + quoted + '"');
-        if (isPart)
-            append(sql, list + "study_words MATCH ?)", {phrase});
-        else
-            append(sql, list + "study_words MATCH ? AND " + matches('+' + column) + ')',
-                   {phrase, textValue(mDialect.pattern(pattern))});
+        const QByteArray part = longestPart(pattern);
+        if (mDialect.hasMatchIndex && part.size() >= kIndexedPart)
+            append(sql, "s.study_id IN (SELECT rowid FROM study_parts WHERE study_parts MATCH ?)",
+                   {textValue(phrase(column, part))});
+        if (!mDialect.hasMatchIndex || part.size() < kIndexedPart)
+            append(sql, "s.study_id IN (SELECT w.study_id FROM study_words w WHERE " + matches("w." + column) + ')',
+                   {whole});
+        else if (pattern != '*' + part + '*')
+            append(sql, matches("(SELECT w." + column + " FROM study_words w WHERE w.study_id = s.study_id)"), {whole});
     }
 
     void addModalities(const SearchTerm& term)
@@ -212,6 +217,7 @@ private:
     }
 
     const SqlDialect& mDialect;
+    const QSet<QByteArray>& mFrequent;
     SearchSql mStudy;
     SearchSql mSeries;
     SearchSql mRequest;
@@ -253,25 +259,36 @@ QByteArray order(const SearchQuery& query, const QByteArray& table)
     return text + table + ".uid";
 }
 
+/// Whether the list is walked for the term anyway.
+bool isWalked(const SearchTerm& term, const QSet<QByteArray>& frequent)
+{
+    if (!term.values.isEmpty())
+        return false;
+    return term.column == SearchColumn::StudyDate ||
+           (!term.patterns.isEmpty() && std::all_of(term.patterns.begin(), term.patterns.end(),
+                                                    [&](const QByteArray& each) { return frequent.contains(each); }));
+}
+
 /// The one modality that is asked for and nothing that narrows the search more.
-const SearchTerm* leadingModality(const SearchQuery& query)
+const SearchTerm* leadingModality(const SearchQuery& query, const QSet<QByteArray>& frequent)
 {
     const SearchTerm* modality = nullptr;
     for (const SearchTerm& term : query.terms) {
         if (term.column == SearchColumn::ModalitiesInStudy && term.values.size() == 1 && term.patterns.isEmpty())
             modality = &term;
-        else if (term.column != SearchColumn::StudyDate || !term.values.isEmpty())
+        else if (!isWalked(term, frequent))
             return nullptr;
     }
     return isNewestFirst(query) ? modality : nullptr;
 }
 
 /// "FROM ... WHERE ..." of the studies that are found, as `s`.
-SearchSql studiesFrom(const SqlDialect& dialect, const SearchQuery& query, bool isListed)
+SearchSql studiesFrom(const SqlDialect& dialect, const SearchQuery& query, bool isListed,
+                      const QSet<QByteArray>& frequent = {})
 {
-    Conditions conditions(dialect);
+    Conditions conditions(dialect, frequent);
     // The list of a modality is kept in its order. Walking it looks at nothing that is not wanted.
-    const SearchTerm* leading = isListed ? leadingModality(query) : nullptr;
+    const SearchTerm* leading = isListed ? leadingModality(query, frequent) : nullptr;
     for (const SearchTerm& term : query.terms) {
         if (&term != leading)
             conditions.add(term);
@@ -299,7 +316,8 @@ SearchSql studiesFrom(const SqlDialect& dialect, const SearchQuery& query, bool 
 
 SearchSql seriesFrom(const SqlDialect& dialect, const SearchQuery& query)
 {
-    Conditions conditions(dialect);
+    static const QSet<QByteArray> kNone;
+    Conditions conditions(dialect, kNone);
     for (const SearchTerm& term : query.terms)
         conditions.add(term);
     const SearchSql series = conditions.series();
@@ -326,10 +344,20 @@ SearchSql counted(const SearchSql& from, int most)
 
 }  // namespace
 
-SearchSql studiesSql(const SqlDialect& dialect, const SearchQuery& query)
+SearchSql countPartsSql(const SqlDialect& dialect, const SearchTerm& term, const QByteArray& pattern, int most)
+{
+    const char* const column = columnOf(term.column).words;
+    const QByteArray part = longestPart(pattern);
+    if (!dialect.hasMatchIndex || column == nullptr || part.size() < kIndexedPart)
+        return {};
+    return {"SELECT COUNT(*) FROM (SELECT 1 FROM study_parts WHERE study_parts MATCH ? LIMIT ?) counted",
+            {textValue(phrase(column, part)), most}};
+}
+
+SearchSql studiesSql(const SqlDialect& dialect, const SearchQuery& query, const QSet<QByteArray>& frequent)
 {
     // The page first, then what it shows: what answers show is large, and would be carried through the sorting.
-    const SearchSql from = studiesFrom(dialect, query, true);
+    const SearchSql from = studiesFrom(dialect, query, true, frequent);
     const bool isByModality = from.text.startsWith(" FROM study_modality");
     SearchSql sql;
     sql.text = QByteArray("SELECT page.*, a.attributes FROM (SELECT ") + kStudyColumns +

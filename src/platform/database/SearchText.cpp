@@ -188,9 +188,11 @@ QByteArray sortName(const QString& name)
 SearchPatterns textPatterns(const QString& query)
 {
     const QByteArray pattern = codedPattern(query);
-    if (pattern == "*")
-        return {};
-    return {{pattern}, !query.contains(QLatin1Char('?'))};
+    SearchPatterns made;
+    if (pattern != "*")
+        made.patterns.append(pattern);
+    made.isExact = !query.contains(QLatin1Char('?'));
+    return made;
 }
 
 SearchPatterns namePatterns(const QString& query)

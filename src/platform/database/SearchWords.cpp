@@ -2,6 +2,7 @@
 
 #include "platform/base/LogFile.h"
 #include "platform/database/SqlConnection.h"
+#include "platform/database/SqlDialect.h"
 
 namespace Kxg
 {
@@ -31,22 +32,40 @@ bool makePostgresIndex(SqlConnection& connection)
     }
 }
 
+/// Of the row that a trigger is called for.
+QString columnsOf(const char* row)
+{
+    QStringList columns = QString::fromLatin1(kColumns).split(QStringLiteral(", "));
+    for (QString& column : columns)
+        column.prepend(QLatin1String(row));
+    return columns.join(QStringLiteral(", "));
+}
+
 }  // namespace
 
 void makeWordsTable(SqlConnection& connection)
 {
-    if (connection.address().engine == DatabaseAddress::Engine::Sqlite) {
-        connection.execute(QStringLiteral("CREATE VIRTUAL TABLE study_words USING fts5 (%1,"
-                                          " tokenize = 'trigram case_sensitive 1')")
-                               .arg(QLatin1String(kColumns)));
+    const SqlDialect& dialect = SqlDialect::of(connection.address().engine);
+    QString columns = QString::fromLatin1(kColumns);
+    columns.replace(QLatin1String(", "), QLatin1Char(' ') + dialect.text + QLatin1String(" NOT NULL, "));
+    connection.execute(QStringLiteral("CREATE TABLE study_words (study_id %1 NOT NULL PRIMARY KEY, %2 %3 NOT NULL)")
+                           .arg(dialect.key, columns, dialect.text));
+    if (!dialect.hasMatchIndex) {
+        makePostgresIndex(connection);
         return;
     }
-    QString columns = QString::fromLatin1(kColumns);
-    columns.replace(QLatin1String(", "), QLatin1String(" TEXT COLLATE \"C\" NOT NULL, "));
-    connection.execute(QStringLiteral("CREATE TABLE study_words (study_id BIGINT NOT NULL PRIMARY KEY,"
-                                      " %1 TEXT COLLATE \"C\" NOT NULL)")
-                           .arg(columns));
-    makePostgresIndex(connection);
+    // The index knows the table and is told of each change of it. So texts are read without it, too, which is faster
+    // where many have the part, and where the part is too short for it.
+    connection.execute(QStringLiteral("CREATE VIRTUAL TABLE study_parts USING fts5 (%1, content = 'study_words',"
+                                      " content_rowid = 'study_id', tokenize = 'trigram case_sensitive 1')")
+                           .arg(QLatin1String(kColumns)));
+    connection.execute(QStringLiteral("CREATE TRIGGER study_words_come AFTER INSERT ON study_words BEGIN"
+                                      " INSERT INTO study_parts (rowid, %1) VALUES (new.study_id, %2); END")
+                           .arg(QLatin1String(kColumns), columnsOf("new.")));
+    connection.execute(QStringLiteral("CREATE TRIGGER study_words_go AFTER DELETE ON study_words BEGIN"
+                                      " INSERT INTO study_parts (study_parts, rowid, %1)"
+                                      " VALUES ('delete', old.study_id, %2); END")
+                           .arg(QLatin1String(kColumns), columnsOf("old.")));
 }
 
 bool obtainWordsIndex(SqlConnection& connection)

@@ -26,7 +26,6 @@ SqlDialect sqlite()
     dialect.text = QStringLiteral("TEXT");
     dialect.bytes = QStringLiteral("BLOB");
     dialect.bytesOf = QStringLiteral("CAST(%1 AS BLOB)");
-    dialect.wordsKey = QStringLiteral("rowid");
     dialect.wordsOf = QStringLiteral("%1 GLOB ?");
     dialect.hasMatchIndex = true;
     return dialect;
@@ -62,7 +61,6 @@ SqlDialect postgres()
     dialect.text = QStringLiteral("TEXT COLLATE \"C\"");
     dialect.bytes = QStringLiteral("BYTEA");
     dialect.bytesOf = QStringLiteral("convert_to(%1, 'UTF8')");
-    dialect.wordsKey = QStringLiteral("study_id");
     dialect.wordsOf = QStringLiteral("%1 LIKE ?");
     return dialect;
 }

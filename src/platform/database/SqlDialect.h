@@ -31,13 +31,12 @@ struct SqlDialect
     QString bytesOf;  ///< the bytes of a text, which stands in place of %1
 
     // texts of studies, which are searched for parts
-    QString wordsKey;  ///< what the table of them calls the study's id
-    QString wordsOf;   ///< whether the column %1 matches a pattern
+    QString wordsOf;  ///< whether the column %1 matches a pattern
 
     /// A pattern of `*` and of what stands for itself, as the engine writes it.
     QByteArray pattern(const QByteArray& stars) const;
 
-    bool hasMatchIndex = false;  ///< the table of them is asked by a question of its own kind
+    bool hasMatchIndex = false;  ///< parts are found by a table of its own, and not by the engine's choice
 
     static const SqlDialect& of(DatabaseAddress::Engine engine);
 };

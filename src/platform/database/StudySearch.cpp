@@ -16,6 +16,10 @@ namespace
 
 using Access = SqlConnection::Access;
 
+/// From so many on, of however many studies, it takes less time to walk the list than to find and sort all that have a
+/// part of a text.
+constexpr int kFrequent = 2000;
+
 constexpr int kStudyColumns = 9;
 constexpr int kSortColumns = 8;  // which the engine gives along
 
@@ -63,6 +67,23 @@ struct StudySearch::Private
         });
     }
 
+    /// The patterns of the query that many studies have.
+    Kdd::Result findFrequent(const SearchQuery& query, QSet<QByteArray>& frequent)
+    {
+        return transact(Access::Read, [&] {
+            for (const SearchTerm& term : query.terms) {
+                for (const QByteArray& pattern : term.patterns) {
+                    const SearchSql sql = countPartsSql(dialect(), term, pattern, kFrequent);
+                    if (sql.text.isEmpty())
+                        continue;
+                    SqlRows rows = connection.ask(sql.text, sql.values);
+                    if (rows.next() && rows.number(0) >= kFrequent)
+                        frequent.insert(pattern);
+                }
+            }
+        });
+    }
+
     SqlConnection connection;
 };
 
@@ -86,7 +107,11 @@ StudySearch::~StudySearch() = default;
 Kdd::Result StudySearch::studies(const SearchQuery& query, std::vector<FoundStudy>& found)
 {
     found.clear();
-    return d->ask(studiesSql(d->dialect(), query),
+    QSet<QByteArray> frequent;
+    const Kdd::Result counted = d->findFrequent(query, frequent);
+    if (counted.bad())
+        return counted;
+    return d->ask(studiesSql(d->dialect(), query, frequent),
                   [&](const SqlRows& rows) { found.push_back(studyOf(rows, kStudyColumns + kSortColumns)); });
 }
 
@@ -180,7 +205,9 @@ Kdd::Result StudySearch::prepare()
 
 Kdd::Result StudySearch::explainStudies(const SearchQuery& query, QByteArray& plan)
 {
-    SearchSql sql = studiesSql(d->dialect(), query);
+    QSet<QByteArray> frequent;
+    d->findFrequent(query, frequent);
+    SearchSql sql = studiesSql(d->dialect(), query, frequent);
     const bool isSqlite = d->connection.address().engine == DatabaseAddress::Engine::Sqlite;
     sql.text.prepend(isSqlite ? "EXPLAIN QUERY PLAN " : "EXPLAIN (ANALYZE, BUFFERS) ");
     plan.clear();

@@ -20,7 +20,7 @@ constexpr int kMaxRows = 20000;
 constexpr int kMaxTagFiles = 500;
 
 // Clients only want to know that there is more; to count all of a large archive takes longer than to find the page.
-constexpr int kMaxRemaining = 10000;
+constexpr int kMaxRemaining = 1000;
 
 constexpr int kRowsAtOnce = 1000;
 constexpr int kSeriesAtOnce = 500;

@@ -9,6 +9,7 @@ namespace
 {
 
 constexpr const char* kName = "Group='0010' Element='0010'";
+constexpr const char* kStudy = "Group='0020' Element='000d'";
 
 /// What operations do to a study shows at once in searches and in the feed of changes.
 class SearchOperations : public SearchedArchive
@@ -113,16 +114,16 @@ TEST_P(SearchOperations, CorrectionsAndMoves)
     EXPECT_EQ(studies("PatientName=poe"), "1");
     EXPECT_EQ(studies("PatientName=doe"), "");
     EXPECT_EQ(told(), "corrected 1");
-    correct("2", "1.1", "1", kName, "Roe^Jane");
-    EXPECT_EQ(shown(), "1 Doe^John 1; 2 Roe^Jane 2; ");
+    correct("2", "1.1", "1", kStudy, "2");
+    EXPECT_EQ(shown(), "1 Doe^John 1; 2 Poe^P 2; ");
     EXPECT_EQ(told(), "moved 2, moved 1");
     EXPECT_EQ(list("instances?SOPInstanceUID=1.1").size(), 1);
     EXPECT_EQ(values("instances?SOPInstanceUID=1.1", "0020000D"), "2");
-    correct("9", "1.2", "1", kName, "Doe^John");
-    EXPECT_EQ(shown(), "2 Roe^Jane 2; 9 Doe^John 1; ");
+    correct("9", "1.2", "1", kStudy, "9");
+    EXPECT_EQ(shown(), "2 Poe^P 2; 9 Doe^John 1; ");
     EXPECT_EQ(told(), "moved 9, deleted 1");
     kdd("build --all --again");
-    EXPECT_EQ(shown(), "2 Roe^Jane 2; 9 Doe^John 1; ");
+    EXPECT_EQ(shown(), "2 Poe^P 2; 9 Doe^John 1; ");
 }
 
 TEST_P(SearchOperations, ACorrectionOfAnOldTagFileShowsAtOnce)

@@ -110,7 +110,7 @@ private:
             QStringList components;
             for (const QString& each : group.split(QLatin1Char('^')))
                 components << folded(each);
-            while (components.size() < 5)
+            while (query.contains(QLatin1Char('^')) && components.size() < 5)
                 components << QString();
             if (!group.trimmed().isEmpty() && fits(components.join(QLatin1Char('^')), parts + QLatin1String("(\\^.*)?")))
                 return true;
@@ -226,7 +226,8 @@ TEST_P(SearchOracle, AgreesOnRandomQuestionsOverRealFiles)
         const bool isDate = key == DCM_StudyDate || key == DCM_PatientBirthDate;
         const QString value = oracle.valueOf(static_cast<int>(random() % 1000), key);
         const QString query = key == DCM_ModalitiesInStudy ? value : question(value, isDate, random);
-        if (query.trimmed() != query || query.isEmpty() || (isDate && QRegularExpression(QStringLiteral("[^0-9-]")).match(query).hasMatch()))
+        // Wildcards alone are no question that an index answers.
+        if (query.trimmed() != query || !query.contains(QRegularExpression(QStringLiteral("[^*?^=]"))) || (isDate && QRegularExpression(QStringLiteral("[^0-9-]")).match(query).hasMatch()))
             continue;
         const QByteArray target = QByteArray("studies?limit=1000&") + QByteArray::number((quint32(key.getGroup()) << 16) | key.getElement(), 16).rightJustified(8, '0') + '=' +
                                   query.toUtf8().toPercentEncoding();
@@ -234,7 +235,9 @@ TEST_P(SearchOracle, AgreesOnRandomQuestionsOverRealFiles)
         for (const QJsonValue& each : list(target.constData()))
             studies << textOf(each.toObject(), "0020000D");
         studies.sort();
-        EXPECT_EQ(studies, oracle.find(key, query)) << target.toStdString() << " (" << query.toStdString() << ")";
+        EXPECT_EQ(studies.join(QLatin1Char(' ')).toStdString(),
+                  oracle.find(key, query).join(QLatin1Char(' ')).toStdString())
+            << target.toStdString() << " (" << query.toStdString() << ")";
         found += studies.size();
     }
     EXPECT_GT(found, 400);

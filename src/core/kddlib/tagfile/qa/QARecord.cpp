@@ -87,10 +87,6 @@ Result QARecord::claim(const QAData& job)
     if (known.isEmpty())
         return {};
     mCatalogue = std::move(catalogue);
-    if (!job.oldStudyUID.isEmpty()) {
-        mMovedFrom = job.oldStudyUID;
-        mMovedTo = job.studyUID;
-    }
     for (const QByteArray& uid : qAsConst(uids)) {
         const bool isDestination = uid == job.studyUID;
         if (!isDestination && !known.contains(uid))
@@ -312,8 +308,12 @@ void QARecord::finish(const StudyTree& tree, const Kxg::TagFileStamp& stamp, con
     Study& study = found->second;
     Result result;
     Kxg::BuiltStudy shown = builtStudy(tree.series(), stamp);
-    shown.movedFrom = mMovedFrom;
-    shown.movedTo = mMovedTo;
+    for (const QAImageChange& change : mChanges) {
+        if (change.studyUID != change.holder->studyInstanceUID()) {
+            shown.movedFrom = change.studyUID;
+            shown.movedTo = change.holder->studyInstanceUID();
+        }
+    }
     // A tag file that was not the one that the database knows may lack more than this correction.
     if (!study.isRecognised) {
         result = study.claim->noteSearch(shown);
