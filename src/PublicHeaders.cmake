@@ -13,6 +13,7 @@ set(KDD_PUBLIC_HEADERS
   core/kddlib/archive/StudyChange.h
   core/kddlib/archive/StudyCheck.h
   core/kddlib/archive/StudyCompletion.h
+  core/kddlib/archive/StudyIndexing.h
   core/kddlib/archive/StudyIntake.h
   core/kddlib/archive/StudyStacker.h
   core/kddlib/archive/WorkObserver.h
@@ -50,6 +51,7 @@ set(KDD_PUBLIC_HEADERS
   core/kddlib/tagfile/qa/QAAudit.h
   core/kddlib/tagfile/qa/QAData.h
   core/kddlib/tagfile/qa/QASeriesMove.h
+  core/kddlib/tagmodel/AttributeDifference.h
   core/kddlib/tagmodel/OwnAttributes.h
   core/kddlib/tagmodel/TagElement.h
   core/kddlib/tagmodel/TagMap.h
@@ -80,7 +82,10 @@ set(KDD_PUBLIC_HEADERS
   platform/database/Catalogue.h
   platform/database/DirectoryEntry.h
   platform/database/Kxg.h
+  platform/database/SearchRecord.h
+  platform/database/SearchText.h
   platform/database/StorageManager.h
+  platform/database/StudySearch.h
   platform/database/TagFileStamp.h
   platform/filecache/ExFileCache.h
   platform/os/ExclusiveFile.h
@@ -88,6 +93,7 @@ set(KDD_PUBLIC_HEADERS
   platform/os/PathName.h
   platform/os/SystemResult.h
   platform/resources/ExResource.h
+  platform/volume/FrameView.h
   platform/volume/KxCompressedDataMedia.h
   platform/volume/KxHistogram.h
   platform/volume/KxVolumeInfo.h

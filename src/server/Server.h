@@ -1,10 +1,14 @@
 #pragma once
 
+#include "server/access/AddressGuard.h"
 #include "server/http/HttpSettings.h"
+
+#include <QString>
 
 #include <kddlib/Result.h>
 
 #include <memory>
+#include <optional>
 
 namespace Kdd
 {
@@ -12,14 +16,20 @@ namespace Kdd
 struct ServerSettings
 {
     Http::HttpSettings http;
-    QByteArray prefix = "/dicom-web";  ///< of the paths of DICOMweb
+    std::optional<Http::ListenAddress> status;  ///< of a listener for those who watch the server
+    Access::AddressRules addresses;
+    QByteArray prefix = "/dicom-web";      ///< of the paths of DICOMweb
+    QString viewer;                        ///< folder of a viewer's files, served under /viewer; empty: none
+    std::chrono::milliseconds slow{2000};  ///< requests that take longer are told in the log
 };
 
 /// What `kdd serve` runs: DICOMweb over the archive that the process's settings name. Used by one thread.
 class Server
 {
 public:
-    explicit Server(const ServerSettings& settings);
+    /// Null, with the reason in `result`, when the settings cannot be followed. Until it is known who may see what,
+    /// that includes every address that other machines reach.
+    static std::unique_ptr<Server> make(ServerSettings settings, Result& result);
 
     /// Stops.
     ~Server();
@@ -33,8 +43,14 @@ public:
     /// "http://127.0.0.1:8042"
     QByteArray address() const;
 
+    /// Empty when there is no such listener.
+    QByteArray statusAddress() const;
+
 private:
     struct Private;
+
+    explicit Server(std::unique_ptr<Private> made);
+
     std::unique_ptr<Private> d;
 };
 

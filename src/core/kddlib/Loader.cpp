@@ -31,6 +31,7 @@ namespace Kdd
 namespace
 {
 
+/// The dataset is taken out of the file object, which goes; the item keeps it alive.
 std::shared_ptr<Item> itemOf(DcmFileFormat& file)
 {
     return std::make_shared<ItemOF>(std::shared_ptr<DcmDataset>(file.getAndRemoveDataset()));
@@ -103,6 +104,8 @@ QByteArray baseName(const QByteArray& path)
     return path.mid(qMax(path.lastIndexOf('/'), path.lastIndexOf('\\')) + 1);
 }
 
+/// Waits as long as the site allows, for whoever asks a loader would
+/// rather wait than hear that there is nothing.
 bool readTagFile(TagFile& file, const QByteArray& studyUID)
 {
     const Stopwatch stopwatch;
@@ -115,6 +118,7 @@ bool readTagFile(TagFile& file, const QByteArray& studyUID)
 
 bool hasFilePath(const TagMap& image, const char* path)
 {
+    // Only the image's own path counts; one that it inherits may be shared with others.
     const TagElement* held = image.tagsForLevel().value(kFilePath, nullptr);
     const uint length = qstrlen(path);
     return held != nullptr && held->vr() == VrCode::LO && static_cast<uint>(held->value().size()) == length &&
@@ -143,6 +147,7 @@ bool Loader::refresh(const QByteArray& studyUID)
 {
     const auto file = std::make_shared<TagFile>();
     const bool isRead = readTagFile(*file, studyUID);
+    // That a file is there and cannot be read is no reason to forget what was known.
     if (!isRead &&
         (file->wasLockedOut() || QFile::exists(TagFile::cacheFilePathForStudy(studyUID.constData()))))
         return false;
@@ -206,9 +211,12 @@ Volume* Loader::loadVolume(const char* path, const QByteArray& seriesUID, const 
         return nullptr;
     const QByteArray name = baseName(path);
     const int part = partNumberOf(name);
+    // The first volume's file has no part in its name, the second one's is part 2.
     const int index = part < 0 ? 0 : part - 1;
     const QByteArray suffix = Volume::fileNameSuffix(name.constData());
     Volume* volume = index >= 0 ? volumeOfSuffix(*series, suffix, index) : nullptr;
+    // One that only bears the file's name does not answer: without a suffix
+    // the tag file keeps none of a volume's values.
     if (volume != nullptr && volume->fileNameSuffix() == suffix) {
         // The tree as well as the tag file, which may be given another tree by whoever added it.
         mLent.insert(file.study());

@@ -43,6 +43,7 @@ ImagesByPath::ImagesByPath(const TagFile& file)
 std::unique_ptr<TagMap> ImagesByPath::copy(const std::string& path) const
 {
     const TagMap* image = mImages.value(QByteArray::fromStdString(path), nullptr);
+    // The preview stays: an image that comes from the former tag file may have no file to make one from.
     std::unique_ptr<TagMap> copy(image != nullptr ? image->clone() : nullptr);
     for (const DcmTagKey& key :
          {kFilePath, kFileSuffix, kVolumeIndex, kFromDatabase, kHasVolumeFile, kAbstract}) {
@@ -58,6 +59,7 @@ bool StudySources::query(const QByteArray& user, int studyId)
     if (result.bad())
         LogFile::errorf("Database query GetAllFilesOfStudy() failed.");
     else
+        // They also tell the study's UID, by which its images are asked for next.
         result = corrections.read(studyId);
     if (result.good())
         result = queryImages();
@@ -72,6 +74,7 @@ Result StudySources::queryImages()
     Result result = Kxg::GetSeries(corrections.studyUID(), series);
     mListed.clear();
     for (const std::shared_ptr<Kxg::SeriesInfo>& info : qAsConst(series)) {
+        // An image without UID is known by its path, here as in the tree.
         for (const Kxg::ImageFile& file : info->images)
             mListed.insert(file.path, {info->seriesInstanceUID,
                                        file.sopInstanceUID.isEmpty() ? file.path : file.sopInstanceUID});
@@ -101,6 +104,7 @@ std::unique_ptr<TagMap> StudySources::copyFormer(const std::string& path) const
         return nullptr;
     corrections.applyToFormer(*image);
     const QByteArray sopUID = image->uid(TagMap::ImageLevel);
+    // Only now, since corrections may have given it another UID.
     if (listed != mListed.cend() && (sopUID.isEmpty() ? name : sopUID) != listed->key)
         return nullptr;
     return image;
@@ -138,8 +142,10 @@ bool StudySources::collect(const QByteArray& user, int studyId)
                         qUtf8Printable(result.text()));
         return false;
     }
+    // What was recorded may list files in other studies and series, so the study is asked for again.
     if (adopted->isAny() && !query(user, studyId))
         return false;
+    // Sorted, because a set has no order and a build makes the same of the same files.
     QList<QByteArray> unlisted = (adopted->undecided() - listed).values();
     std::sort(unlisted.begin(), unlisted.end());
     for (const QByteArray& path : qAsConst(unlisted))

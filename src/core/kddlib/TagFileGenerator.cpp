@@ -125,12 +125,15 @@ bool TagFileGenerator::createTagFile(TagFile& tagFile, int studyId, const char* 
     mLoadWatch = mVolumeWatch = mPreviewWatch = {};
     mNumKept = mNumMissing = 0;
     tagFile.clear();
+    // Images come first, for volumes and previews are made of what the tree then holds. Labels and placement
+    // come last, when nothing is added any more.
     StudySources sources(loaded);
     if (!sources.collect(mUser, studyId))
         return false;
     for (const std::string& path : sources.dicomFiles)
         addFile(tagFile, path, studyInstanceUID, sources);
     addVolumes(tagFile, sources.volumeFiles, sources);
+    // After the volumes, because an image that a volume shows gets no preview of its own.
     QList<QByteArray> chosen;
     tagFile.selectPreviewImages2D(chosen);
     addPreviews(tagFile, chosen, sources);
@@ -153,6 +156,7 @@ bool TagFileGenerator::write(TagFile& tagFile, StudySources& sources)
     }
     if (!tagFile.writeCacheFile())
         return false;
+    // The study is as it should be already; at worst it is built once more.
     const Result result = sources.adopted->finish();
     if (result.bad())
         LogFile::warnf("%s", qUtf8Printable(result.text()));
@@ -186,6 +190,7 @@ void TagFileGenerator::completeArrivals(TagFile& arrivals, TagFile& present)
         arrivals.selectPreviewImages2D(chosen);
     } else {
         for (const TagMap* image : arrivals.imagesByUID())
+            // Clones, because the arrivals are still to be merged; here they only count for the choice.
             present.addTagMap(image->clone(), nullptr, true);
         present.selectPreviewImages2D(chosen);
     }
@@ -200,10 +205,14 @@ void TagFileGenerator::finishTree(TagFile& tagFile) const
         tagFile.optimizeAll();
 }
 
+/// From the file, and where that cannot be read from the former tag file: an image is not lost
+/// because its file is out of reach for a while.
 void TagFileGenerator::addFile(TagFile& tagFile, const std::string& path, const char* studyInstanceUID,
                                StudySources& sources)
 {
     const QByteArray name = QByteArray::fromStdString(path);
+    // Where it cannot be decided which corrections hold, the image stays as
+    // the tag file has it and its file is not read.
     const bool isUndecided = sources.adopted->undecided().contains(name);
     std::unique_ptr<TagMap> image = isUndecided ? nullptr : readListed(path, studyInstanceUID, sources);
     if (image == nullptr) {
@@ -230,6 +239,7 @@ std::unique_ptr<TagMap> TagFileGenerator::readListed(const std::string& path, co
         image = load(path, sources);
     if (image == nullptr || !sources.corrections.applyTo(*image, name))
         return nullptr;
+    // After the corrections, for one may have moved the image here from the study that its file names.
     if (studyInstanceUID != nullptr && image->uid(TagMap::StudyLevel) != studyInstanceUID) {
         LogFile::warnf(kForeign, path.c_str(), studyInstanceUID);
         return nullptr;
@@ -294,6 +304,7 @@ void TagFileGenerator::addPreviews(TagFile& tagFile, const QList<QByteArray>& ch
         if (image == nullptr)
             continue;
         const QByteArray path = filePathOf(*image);
+        // Its file could not be read before, so the preview that it brought along is the best there is.
         if (sources.kept.contains(path) && image->findElement(kPreview) != nullptr)
             continue;
         if (DcmDataset* dataset = sources.datasets.find(path))
@@ -322,6 +333,7 @@ void TagFileGenerator::addVolumes(TagFile& tagFile, const std::vector<std::strin
         std::unique_ptr<VolumeInfo> info(createVolumeInfo(path.c_str(), seriesUID));
         const QByteArray name = QByteArray::fromStdString(path);
         if (info == nullptr) {
+            // The suffix is all that tells the volume of a file that cannot be read.
             unreadable.insert(Volume::fileNameSuffix(name.mid(name.lastIndexOf('/') + 1).constData()));
             continue;
         }
@@ -356,6 +368,7 @@ VolumeInfo* TagFileGenerator::createVolumeInfo(const char* path, QByteArray& ser
     return info.release();
 }
 
+/// Of the middle slice. Of a mammogram the same picture tells where the breast lies.
 void TagFileGenerator::addPreview(OrlanMesh& mesh, const char* path, VolumeInfo& info)
 {
     const StopwatchSum::Running running(mPreviewWatch);

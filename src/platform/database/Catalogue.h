@@ -3,6 +3,7 @@
 #include "platform/base/Export.h"
 #include "platform/base/IfAbsent.h"
 #include "platform/base/Result.h"
+#include "platform/database/SearchRecord.h"
 #include "platform/database/TagFileStamp.h"
 
 #include <QByteArray>
@@ -158,6 +159,16 @@ struct BuiltStudy
     /// also those of the study.
     std::vector<DicomFileRecord> series;
 
+    /// What searches know of it from now on.
+    StudySearchRecord search;
+
+    /// Other than by what arrived, left or was corrected: others are not told of it.
+    bool isOnlyRearranged = false;
+
+    /// Of images that a correction moved: where they were and are. Empty: none was.
+    QByteArray movedFrom;
+    QByteArray movedTo;
+
     /// When the tag file is to be built once more although nothing changed [ms since the epoch]; 0: not at all. Until
     /// then the study does not wait.
     qint64 settleAt = 0;
@@ -209,6 +220,10 @@ public:
     /// Keeps the same of a study whose tag file was changed in one respect, and takes back the one request that this
     /// change left. Other requests stay: what they ask for is still to be done.
     virtual Kdd::Result finishChange(const BuiltStudy& built, qint64 request) = 0;
+
+    /// Keeps only what searches know of the study, whose tag file may lack more than what was done to it now: the study
+    /// goes on waiting.
+    virtual Kdd::Result noteSearch(const BuiltStudy& built) = 0;
 
     /// As `finish` for a study that has neither files nor a tag file any more: forgets it, unless it got files meanwhile.
     virtual Kdd::Result finishRemoved() = 0;

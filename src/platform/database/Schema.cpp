@@ -1,5 +1,6 @@
 #include "platform/database/Schema.h"
 
+#include "platform/database/SearchWords.h"
 #include "platform/database/SqlConnection.h"
 #include "platform/database/SqlDialect.h"
 
@@ -93,6 +94,60 @@ const QStringList kSteps[] = {
             " AND correction.shown_image = CASE WHEN file.sop_uid = '' THEN file.path"
             " ELSE {bytes of file.sop_uid} END) WHERE kind = 1 AND EXISTS (SELECT 1 FROM correction)"),
     },
+    {
+        // What searches ask for. Rows are narrow, and what answers show stands apart, so that a walk in the order of the
+        // dates reads little. The size and time of the tag file that a row was taken from tell whether it still holds.
+        QStringLiteral(
+            "CREATE TABLE study_search (study_id {key} NOT NULL PRIMARY KEY"
+            " REFERENCES study (id) ON DELETE CASCADE, uid {text} NOT NULL,"
+            " is_built SMALLINT NOT NULL, file_size BIGINT NOT NULL, file_modified BIGINT NOT NULL,"
+            " digest {bytes} NOT NULL, study_date {text} NOT NULL, study_time {text} NOT NULL,"
+            " accession_number {text} NOT NULL, patient_id {text} NOT NULL,"
+            " patient_birth_date {text} NOT NULL, patient_sex {text} NOT NULL, study_code {text} NOT NULL,"
+            " sort_name {text} NOT NULL, modalities {text} NOT NULL, series_count BIGINT NOT NULL,"
+            " instance_count BIGINT NOT NULL)"),
+        QStringLiteral("CREATE INDEX study_search_by_date ON study_search"
+                       " (study_date DESC, study_time DESC, uid)"),
+        QStringLiteral("CREATE INDEX study_search_by_uid ON study_search (uid)"),
+        QStringLiteral("CREATE INDEX study_search_by_name ON study_search"
+                       " (sort_name, patient_id, study_date DESC, study_time DESC, uid)"),
+        QStringLiteral("CREATE INDEX study_search_by_patient ON study_search"
+                       " (patient_id, study_date DESC, study_time DESC, uid)"),
+        QStringLiteral("CREATE INDEX study_search_by_accession ON study_search"
+                       " (accession_number, study_date DESC, study_time DESC, uid)"),
+        QStringLiteral("CREATE INDEX study_search_by_code ON study_search (study_code)"),
+        QStringLiteral("CREATE INDEX study_search_by_birth ON study_search (patient_birth_date)"),
+        QStringLiteral("CREATE TABLE study_answer (study_id {key} NOT NULL PRIMARY KEY"
+                       " REFERENCES study_search (study_id) ON DELETE CASCADE, attributes {bytes} NOT NULL)"),
+        QStringLiteral("{words table}"),
+        // With the order of the list, so that the first page of a modality is read and no more.
+        QStringLiteral("CREATE TABLE study_modality (modality {text} NOT NULL, study_date {text} NOT NULL,"
+                       " study_time {text} NOT NULL, uid {text} NOT NULL, study_id BIGINT NOT NULL"
+                       " REFERENCES study_search (study_id) ON DELETE CASCADE,"
+                       " PRIMARY KEY (study_id, modality))"),
+        QStringLiteral("CREATE INDEX study_modality_by_date ON study_modality"
+                       " (modality, study_date DESC, study_time DESC, uid, study_id)"),
+        QStringLiteral("CREATE TABLE series_search (study_id BIGINT NOT NULL"
+                       " REFERENCES study_search (study_id) ON DELETE CASCADE, uid {text} NOT NULL,"
+                       " modality {text} NOT NULL, series_number BIGINT NOT NULL,"
+                       " number_text {text} NOT NULL, description {text} NOT NULL,"
+                       " performed_date {text} NOT NULL, performed_time {text} NOT NULL,"
+                       " instance_count BIGINT NOT NULL, attributes {bytes} NOT NULL,"
+                       " PRIMARY KEY (study_id, uid))"),
+        QStringLiteral("CREATE INDEX series_search_by_uid ON series_search (uid)"),
+        QStringLiteral("CREATE INDEX series_search_by_performed ON series_search"
+                       " (performed_date, performed_time)"),
+        QStringLiteral("CREATE TABLE series_request (study_id BIGINT NOT NULL"
+                       " REFERENCES study_search (study_id) ON DELETE CASCADE, uid {text} NOT NULL,"
+                       " scheduled_step {text} NOT NULL, requested_procedure {text} NOT NULL)"),
+        QStringLiteral("CREATE INDEX series_request_of_series ON series_request (study_id, uid)"),
+        QStringLiteral("CREATE INDEX series_request_by_step ON series_request (scheduled_step)"),
+        QStringLiteral("CREATE INDEX series_request_by_procedure ON series_request (requested_procedure)"),
+        // What happened to studies, in the order in which others could see it.
+        QStringLiteral("CREATE TABLE change (position BIGINT NOT NULL PRIMARY KEY, kind SMALLINT NOT NULL,"
+                       " study_uid {text} NOT NULL, from_uid {text} NOT NULL, to_uid {text} NOT NULL,"
+                       " instance_count BIGINT NOT NULL, at BIGINT NOT NULL)"),
+    },
 };
 
 QString firstRow(SqlConnection& connection, const QString& question)
@@ -140,6 +195,11 @@ void takeStep(SqlConnection& connection, int version)
         statement.replace(QLatin1String("{id}"), dialect.id);
         statement.replace(QLatin1String("{text}"), dialect.text);
         statement.replace(QLatin1String("{bytes}"), dialect.bytes);
+        statement.replace(QLatin1String("{key}"), dialect.key);
+        if (statement == QLatin1String("{words table}")) {
+            makeWordsTable(connection);
+            continue;
+        }
         statement.replace(QLatin1String("{bytes of file.sop_uid}"),
                           dialect.bytesOf.arg(QLatin1String("file.sop_uid")));
         connection.execute(statement);

@@ -143,6 +143,7 @@ SqlConnection::~SqlConnection() = default;
 
 void SqlConnection::reopen()
 {
+    mOnce.reset();
     mStatements.clear();
     mOpened.reset();
     const SqlDialect& dialect = SqlDialect::of(mAddress.engine);
@@ -224,7 +225,11 @@ QSqlQuery& SqlConnection::run(const QByteArray& sql, const QVariantList& values)
             throw errorOf(query.lastError());
         found = mStatements.emplace(sql, query).first;
     }
-    QSqlQuery& query = found->second;
+    return execute(found->second, values);
+}
+
+QSqlQuery& SqlConnection::execute(QSqlQuery& query, const QVariantList& values)
+{
     for (int i = 0; i < values.size(); ++i)
         query.bindValue(i, values[i]);
     if (!query.exec())
@@ -235,6 +240,17 @@ QSqlQuery& SqlConnection::run(const QByteArray& sql, const QVariantList& values)
 SqlRows SqlConnection::ask(const QByteArray& sql, const QVariantList& values)
 {
     return SqlRows(run(sql, values));
+}
+
+SqlRows SqlConnection::askOnce(const QByteArray& sql, const QVariantList& values)
+{
+    if (!mOpened)
+        throw DatabaseError(QStringLiteral("the connection is lost"));
+    mOnce = std::make_unique<QSqlQuery>(mOpened->database);
+    mOnce->setForwardOnly(true);
+    if (!mOnce->prepare(QString::fromLatin1(sql)))
+        throw errorOf(mOnce->lastError());
+    return SqlRows(execute(*mOnce, values));
 }
 
 int SqlConnection::change(const QByteArray& sql, const QVariantList& values)

@@ -89,6 +89,9 @@ public:
     /// `values` stand for the question marks in `sql`.
     SqlRows ask(const QByteArray& sql, const QVariantList& values = {});
 
+    /// The same for a statement of which there are too many to be kept; until the next one of these.
+    SqlRows askOnce(const QByteArray& sql, const QVariantList& values);
+
     /// How many rows were changed.
     int change(const QByteArray& sql, const QVariantList& values = {});
 
@@ -98,6 +101,7 @@ public:
 private:
     struct Opened;
 
+    QSqlQuery& execute(QSqlQuery& query, const QVariantList& values);
     QSqlQuery& run(const QByteArray& sql, const QVariantList& values);
     void begin(Access access);
     void beginOnce(Access access);
@@ -109,6 +113,7 @@ private:
     const IfAbsent mIfAbsent;
     std::unique_ptr<Opened> mOpened;
     std::map<QByteArray, QSqlQuery> mStatements;  // of mOpened, and gone before it
+    std::unique_ptr<QSqlQuery> mOnce;             // likewise
 };
 
 }  // namespace Kxg

@@ -21,9 +21,14 @@ SqlDialect sqlite()
     dialect.hasSchema = QStringLiteral("SELECT COUNT(*) FROM sqlite_master WHERE name = 'schema_version'");
     // Without the last word the number of a deleted row would be given out again.
     dialect.id = QStringLiteral("INTEGER PRIMARY KEY AUTOINCREMENT");
+    // By this very word a key is the row's own number, and needs no index.
+    dialect.key = QStringLiteral("INTEGER");
     dialect.text = QStringLiteral("TEXT");
     dialect.bytes = QStringLiteral("BLOB");
     dialect.bytesOf = QStringLiteral("CAST(%1 AS BLOB)");
+    dialect.wordsKey = QStringLiteral("rowid");
+    dialect.wordsOf = QStringLiteral("%1 GLOB ?");
+    dialect.hasMatchIndex = true;
     return dialect;
 }
 
@@ -52,10 +57,13 @@ SqlDialect postgres()
         QStringLiteral("SELECT COUNT(*) FROM pg_tables"
                        " WHERE tablename = 'schema_version' AND schemaname = current_schema()");
     dialect.id = QStringLiteral("BIGINT GENERATED ALWAYS AS IDENTITY PRIMARY KEY");
+    dialect.key = QStringLiteral("BIGINT");
     // In the order of bytes, as with the other engine, whatever language the server was set up for.
     dialect.text = QStringLiteral("TEXT COLLATE \"C\"");
     dialect.bytes = QStringLiteral("BYTEA");
     dialect.bytesOf = QStringLiteral("convert_to(%1, 'UTF8')");
+    dialect.wordsKey = QStringLiteral("study_id");
+    dialect.wordsOf = QStringLiteral("%1 LIKE ?");
     return dialect;
 }
 
@@ -66,6 +74,20 @@ const SqlDialect& SqlDialect::of(DatabaseAddress::Engine engine)
     static const SqlDialect kSqlite = sqlite();
     static const SqlDialect kPostgres = postgres();
     return engine == DatabaseAddress::Engine::Sqlite ? kSqlite : kPostgres;
+}
+
+QByteArray SqlDialect::pattern(const QByteArray& stars) const
+{
+    QByteArray written;
+    for (const char each : stars) {
+        if (hasMatchIndex)
+            written += each == '[' || each == '?' ? QByteArray("[") + each + ']' : QByteArray(1, each);
+        else if (each == '*')
+            written += '%';
+        else
+            written += each == '%' || each == '_' || each == '\\' ? QByteArray("\\") + each : QByteArray(1, each);
+    }
+    return written;
 }
 
 }  // namespace Kxg

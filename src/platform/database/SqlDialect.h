@@ -22,12 +22,22 @@ struct SqlDialect
 
     QString hasSchema;  ///< a question that gives one number, not 0 when there is a table "schema_version"
 
-    // column types, named {id}, {text} and {bytes} in the schema
+    // column types, named {id}, {key}, {text} and {bytes} in the schema
     QString id;     ///< a key that the engine numbers, never using a number twice
+    QString key;    ///< a key that somebody else has numbered
     QString text;   ///< UTF-8, in the order of its bytes
     QString bytes;  ///< likewise
 
     QString bytesOf;  ///< the bytes of a text, which stands in place of %1
+
+    // texts of studies, which are searched for parts
+    QString wordsKey;  ///< what the table of them calls the study's id
+    QString wordsOf;   ///< whether the column %1 matches a pattern
+
+    /// A pattern of `*` and of what stands for itself, as the engine writes it.
+    QByteArray pattern(const QByteArray& stars) const;
+
+    bool hasMatchIndex = false;  ///< the table of them is asked by a question of its own kind
 
     static const SqlDialect& of(DatabaseAddress::Engine engine);
 };

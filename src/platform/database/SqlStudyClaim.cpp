@@ -1,3 +1,5 @@
+#include "platform/database/ChangeLog.h"
+#include "platform/database/SearchRows.h"
 #include "platform/database/SqlCatalogue.h"
 #include "platform/database/StudyContent.h"
 #include "platform/database/StudyDescription.h"
@@ -98,9 +100,18 @@ public:
         return conclude({request}, [&] { keep(built); });
     }
 
+    Kdd::Result noteSearch(const BuiltStudy& built) override
+    {
+        return conclude({}, [&] { keepSearch(built); });
+    }
+
     Kdd::Result finishRemoved() override
     {
         return conclude(mStudy.requests, [this] {
+            if (searchRowOf(mConnection, mStudyId).isBuilt)
+                noteChange(mConnection, {ChangeKind::Deleted, mStudy.uid, {}, {}, 0});
+            removeSearchRows(mConnection, mStudyId);
+            putRegisteredRows(mConnection, mStudyId);
             // Also for a study that stays because it got files meanwhile: it has no tag file now.
             mConnection.change("UPDATE study SET tag_file_size = 0, tag_file_digest = NULL WHERE id = ?",
                                {mStudyId});
@@ -129,9 +140,38 @@ private:
 
     void keep(const BuiltStudy& built)
     {
+        keepSearch(built);
         mConnection.change("UPDATE study SET tag_file_size = ?, tag_file_digest = ? WHERE id = ?",
                            {built.tagFile.size, bytesValue(built.tagFile.digest), mStudyId});
         describe(built.series);
+    }
+
+    void keepSearch(const BuiltStudy& built)
+    {
+        const SearchRowState row = searchRowOf(mConnection, mStudyId);
+        int instances = 0;
+        for (const SeriesSearchRecord& series : built.search.series)
+            instances += series.instances;
+        // A tag file without images is that of a study that goes on waiting for its first one.
+        if (built.search.series.empty())
+            removeSearchRows(mConnection, mStudyId);
+        else
+            putSearchRows(mConnection, mStudyId, built.search, built.tagFile);
+        // What was shown so far is what the rows were taken from, whatever tag file the study is said to have.
+        const bool isSame = built.movedTo.isEmpty() && row.tagFile.digest == built.tagFile.digest;
+        if (row.isBuilt && (isSame || built.isOnlyRearranged))
+            return;
+        noteChange(mConnection, {kindOf(built, row, instances), mStudy.uid, built.movedFrom, built.movedTo,
+                                 instances});
+    }
+
+    static ChangeKind kindOf(const BuiltStudy& built, const SearchRowState& row, int instances)
+    {
+        if (!built.movedTo.isEmpty())
+            return ChangeKind::Moved;
+        if (!row.isBuilt || instances > row.instances)
+            return ChangeKind::Arrived;
+        return instances < row.instances ? ChangeKind::Deleted : ChangeKind::Corrected;
     }
 
     void describe(const std::vector<DicomFileRecord>& series)

@@ -1,5 +1,6 @@
 #include "platform/database/StudyContent.h"
 
+#include "platform/database/SearchRows.h"
 #include "platform/database/SqlConnection.h"
 
 #include <QDateTime>
@@ -66,6 +67,7 @@ void concludeChange(SqlConnection& connection, qint64 studyId, QMap<QByteArray, 
     connection.change("DELETE FROM series WHERE study_id = ?"
                       " AND NOT EXISTS (SELECT 1 FROM file WHERE file.series_id = series.id)",
                       {studyId});
+    putRegisteredRows(connection, studyId);
     const qint64 request = leaveRequest(connection, studyId);
     SqlRows rows = connection.ask("SELECT uid FROM study WHERE id = ?", {studyId});
     if (rows.next())

@@ -16,7 +16,8 @@ struct Exchange
     int status = 0;
     qint64 bytes = 0;                      ///< sent, with the header
     std::chrono::microseconds duration{};  ///< from the whole request to the last byte handed to the system
-    QString fault;                         ///< why the answer ended early; empty when it is whole
+    bool isWhole = false;                  ///< the answer; else it was broken off
+    QString fault;                         ///< why we did that; empty when the client did
 };
 
 /// Is told of every exchange. Called on several threads at the same time.

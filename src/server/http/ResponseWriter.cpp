@@ -333,7 +333,7 @@ ResponseWriter::Step ResponseWriter::send(Transport& transport)
         case Transport::Outcome::Ended:
             return broken(QStringLiteral("the file was cut short"));
         case Transport::Outcome::Failed:
-            return broken(QStringLiteral("the client went away"));
+            return broken({});
         }
     }
     return Step::Yields;

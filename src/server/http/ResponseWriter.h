@@ -25,7 +25,7 @@ public:
         WantsRead,   ///< to be called again when something has come
         WantsWrite,  ///< when there is room
         Yields,      ///< after others had their turn
-        Broken,      ///< the connection cannot be used any more; `fault` says why
+        Broken,      ///< the connection cannot be used any more; `fault` says why, unless the client left
     };
 
     /// An answer that cannot be sent as it is, because a header or a range is wrong, is replaced by 500 and logged.

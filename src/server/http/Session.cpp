@@ -76,7 +76,7 @@ void Session::abort()
     if (mIsWithWorker)
         ::shutdown(mConnection->descriptor(), SHUT_RDWR);
     else
-        close(QStringLiteral("the server stops"));
+        close();
 }
 
 void Session::wait(Connection::For what, Next next)
@@ -92,7 +92,7 @@ void Session::wait(Connection::For what, Next next)
 void Session::expire()
 {
     if (mWriter) {
-        close(QStringLiteral("the client takes nothing"));
+        close();
     } else if (mIsRequest && !mIsDraining) {
         answerAtOnce(failure(408, reasonFor(408)), Afterwards::Close);
     } else {
@@ -191,8 +191,8 @@ void Session::prepareRequest()
     mRequest = mReader.take();
     mRequest.peer = mPeer;
     mRequest.id = requestId(mRequest.header("x-request-id"));
-    mStays = mReader.keepsConnection();
-    mRequest.base = QByteArray(mTransport->scheme()) + "://" + mReader.host();
+    mRequest.base = QByteArray(mTransport->scheme()) + "://" +
+                    (mReader.host().isEmpty() ? mHost.settings.address.text() : mReader.host());
 }
 
 void Session::dispatch()
@@ -213,7 +213,7 @@ void Session::answerAtOnce(Response response, Afterwards afterwards)
 {
     if (mRequest.id.isEmpty())
         prepareRequest();
-    mStays = mStays && afterwards == Afterwards::Stay;
+    mIsRefused = afterwards == Afterwards::Close;
     ++mHost.inFlight;
     mIsWithWorker = true;
     write(std::move(response));
@@ -238,7 +238,7 @@ void Session::write(Response response)
     ResponseForm form;
     form.isHead = mRequest.method == Method::Head;
     form.isOldVersion = mReader.isOldVersion();
-    form.keepsConnection = mStays && !mHost.stops;
+    form.keepsConnection = mReader.keepsConnection() && !mIsRefused && !mHost.stops;
     form.id = mRequest.id;
     mWriter.emplace(std::move(response), form);
     send();
@@ -283,22 +283,24 @@ void Session::sendOn()
 void Session::finish()
 {
     const bool keepsConnection = mWriter->keepsConnection();
-    report({});
+    report(true);
     mIsRequest = false;
-    if (!keepsConnection)
+    if (mIsRefused) {
         closeSoftly();
-    else if (mHost.stops)
+    } else if (!keepsConnection || mHost.stops) {
+        mTransport->endWriting();
         close();
-    else
+    } else {
         awaitRequest();
+    }
 }
 
-void Session::report(const QString& fault)
+void Session::report(bool isWhole)
 {
     --mHost.inFlight;
     const auto duration = std::chrono::duration_cast<std::chrono::microseconds>(Clock::now() - mBegan);
-    mHost.observer.ended({mRequest, mWriter->status(), mWriter->bytesSent(), duration,
-                          mWriter->fault().isEmpty() ? fault : mWriter->fault()});
+    mHost.observer.ended(
+        {mRequest, mWriter->status(), mWriter->bytesSent(), duration, isWhole, mWriter->fault()});
     mWriter.reset();
     mRequest = {};
 }
@@ -326,12 +328,12 @@ void Session::drain()
         close();
 }
 
-void Session::close(const QString& reason)
+void Session::close()
 {
     if (!mConnection->isOpen())
         return;
     if (mWriter)
-        report(reason);
+        report(false);
     mConnection->close();
     mClosed(*this);
 }

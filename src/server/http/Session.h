@@ -70,10 +70,10 @@ private:
     void sent(ResponseWriter::Step step);
     void sendOn();
     void finish();
-    void report(const QString& fault);
+    void report(bool isWhole);
     void closeSoftly();
     void drain();
-    void close(const QString& reason = {});
+    void close();
 
     SessionHost& mHost;
     std::shared_ptr<Connection> mConnection;
@@ -88,7 +88,7 @@ private:
     bool mIsRequest = false;   // something of a request has come that is not answered yet
     bool mIsWithWorker = false;
     bool mIsDraining = false;
-    bool mStays = false;  // after the answer, as far as the client is concerned
+    bool mIsRefused = false;  // the client may still send what nobody reads
     qint64 mDrained = 0;
 };
 

@@ -3,8 +3,10 @@
 #include "tools/kdd/Report.h"
 #include "tools/kdd/Selection.h"
 
+#include <kddlib/Kxg.h>
 #include <kddlib/LogFile.h>
 #include <kddlib/StudyBuilders.h>
+#include <kddlib/StudyIndexing.h>
 
 #include <cstdio>
 #include <memory>
@@ -21,6 +23,7 @@ struct BuildRequest
     bool again = false;         ///< with all: also what has a tag file that nothing changed since
     bool settle = false;        ///< also what was merged and would wait for its time
     bool leavesPlaces = false;  ///< attributes stay where they were found
+    bool search = false;        ///< makes searches know what is built, and nothing else
     int jobs = 1;
 };
 
@@ -37,8 +40,33 @@ void report(const GlobalOptions& options, const BuildTotals& totals)
     }
 }
 
+/// Reads tag files only; nothing is built.
+Outcome fillSearch(const GlobalOptions& options)
+{
+    Result opened;
+    const std::unique_ptr<Kxg::StudySearch> search = Kxg::StudySearch::open(Kxg::DatabaseServer(), opened);
+    if (!succeeded(opened))
+        return Outcome::Failed;
+    CommandProgress progress("Indexing", !options.quiet);
+    StudyIndexing::Totals totals;
+    const bool isDone = StudyIndexing(*search).fill(progress, totals);
+    if (options.json)
+        printJson({{QStringLiteral("studies"), totals.studies}, {QStringLiteral("failed"), totals.failed}});
+    else if (!options.quiet)
+        std::printf("%d studies are known to searches now, %d failed\n", totals.studies, totals.failed);
+    const QByteArray finished = QByteArray::number(totals.studies) + " studies are indexed";
+    return !toldOfInterrupt(finished.constData()) && isDone && totals.failed == 0 ? Outcome::Done : Outcome::Failed;
+}
+
 Outcome runBuild(const GlobalOptions& options, const BuildRequest& request)
 {
+    const bool isBuilding = request.selection.all || !request.selection.studies.isEmpty() || request.settle;
+    if (request.search && isBuilding) {
+        LogFile::errorf("--search builds nothing: name neither studies nor --all nor --settle with it");
+        return Outcome::WrongUsage;
+    }
+    if (request.search)
+        return fillSearch(options);
     // With both, the names would have no effect.
     if (request.selection.all && !request.selection.studies.isEmpty()) {
         LogFile::errorf("Name the studies to build, or --all");
@@ -75,7 +103,8 @@ void declareBuild(CommandSet& commands)
         "the work.",
         "kdd build                              # what waits\n"
         "kdd build --all --again --jobs 4       # everything, four studies at once\n"
-        "kdd build 2.25.2062                    # a unique beginning of the UID is enough"};
+        "kdd build 2.25.2062                    # a unique beginning of the UID is enough\n"
+        "kdd build --search                     # once, for an archive of an earlier release"};
     const auto request = std::make_shared<BuildRequest>();
     ArgumentList arguments = commands.declare(
         text, [request](const GlobalOptions& options) { return runBuild(options, *request); });
@@ -84,6 +113,8 @@ void declareBuild(CommandSet& commands)
     arguments.flag("--settle", request->settle,
                    "Also studies that images were merged into lately, without waiting");
     arguments.flag("--no-optimize", request->leavesPlaces, "Leave every attribute where it was found");
+    arguments.flag("--search", request->search,
+                   "Build nothing; make searches know studies that were built before there were any");
     arguments.number("--jobs", 1, 256, request->jobs, "Studies built at once");
 }
 

@@ -1,4 +1,5 @@
 #include "DatabaseFixture.h"
+#include "platform/database/StudySearch.h"
 
 using namespace Kxg;
 
@@ -28,8 +29,10 @@ const char* const kFirstTables[] = {
     " PRIMARY KEY (section, name))",
     "INSERT INTO study (uid, is_described, patient_name) VALUES ('1', 1, 'Doe')",
     "INSERT INTO series (study_id, uid, modality) VALUES (1, '1.1', 'CT')",
-    "INSERT INTO file VALUES ({/d/a}, 5, 7, 1, 1, 'x'), ({/d/b}, 5, 7, 1, 1, 'x'), ({/d/c}, 5, 7, 1, 1, ''),"
-    " ({/d/d}, 5, 7, 1, 1, ''), ({/d/v}, 5, 7, 2, 1, ''), ({/d/o}, 5, 7, 0, NULL, '')",
+    "INSERT INTO file VALUES (CAST('/d/a' AS {bytes}), 5, 7, 1, 1, 'x'), (CAST('/d/b' AS {bytes}), 5, 7, 1, "
+    "1, 'x'),"
+    " (CAST('/d/c' AS {bytes}), 5, 7, 1, 1, ''), (CAST('/d/d' AS {bytes}), 5, 7, 1, 1, ''),"
+    " (CAST('/d/v' AS {bytes}), 5, 7, 2, 1, ''), (CAST('/d/o' AS {bytes}), 5, 7, 0, NULL, '')",
     "INSERT INTO build_request (study_id) VALUES (1)",
 };
 
@@ -46,11 +49,6 @@ protected:
                                  : QStringLiteral("BIGINT GENERATED ALWAYS AS IDENTITY PRIMARY KEY"));
             sql.replace(QLatin1String("{bytes}"),
                         isSqlite ? QStringLiteral("BLOB") : QStringLiteral("BYTEA"));
-            for (const char* path : {"/d/a", "/d/b", "/d/c", "/d/d", "/d/v", "/d/o"}) {
-                const QString hex = QString::fromLatin1(QByteArray(path).toHex());
-                sql.replace(QLatin1Char('{') + QLatin1String(path) + QLatin1Char('}'),
-                            isSqlite ? QStringLiteral("x'%1'").arg(hex) : QStringLiteral("'\\x%1'").arg(hex));
-            }
             execute(sql.toUtf8().constData());
         }
     }
@@ -82,13 +80,39 @@ TEST_P(MigrationTest, ADatabaseOfTheSecondSchemaKnowsWhichFilesACorrectionMoved)
 {
     add({dicom("/d/a", "1", "1.1", "x"), dicom("/d/b", "1", "1.1", "")});
     correct({{"1", "x", "2", "2.1", "y", "changes"}, {"1", "/d/b", "2", "2.1", "/d/b", "changes"}});
-    for (const char* backwards :
-         {"DROP INDEX file_of_correction", "ALTER TABLE file DROP COLUMN correction_id",
+    for (const char* backwards : {"DROP TABLE change", "DROP TABLE series_request", "DROP TABLE series_search",
+                                  "DROP TABLE study_modality", "DROP TABLE study_words", "DROP TABLE study_answer",
+                                  "DROP TABLE study_search", "DROP INDEX file_of_correction",
+                                  "ALTER TABLE file DROP COLUMN correction_id",
           "UPDATE schema_version SET version = 2"})
         execute(backwards);
     open();  // and bring it up to date
     correct({{"1", "x", "1", "1.1", "x", ""}, {"1", "/d/b", "1", "1.1", "/d/b", ""}});
     EXPECT_EQ(studies(), "1   1/2/0*\n");
+}
+
+/// Back to the schema before searches, with what it had.
+TEST_P(MigrationTest, ADatabaseOfTheThirdSchemaIsFoundBySearchesOnceItIsPrepared)
+{
+    DicomFileRecord file = dicom("/d/a", "1.2", "1.2.1", "x");
+    file.patientName = "Müller^Eva";
+    file.modality = "CT";
+    add({file});
+    for (const char* backwards : {"DROP TABLE change", "DROP TABLE series_request", "DROP TABLE series_search",
+                                  "DROP TABLE study_modality", "DROP TABLE study_words", "DROP TABLE study_answer",
+                                  "DROP TABLE study_search", "UPDATE schema_version SET version = 3"})
+        execute(backwards);
+    Kdd::Result result;
+    const auto search = StudySearch::open(address(), result);
+    ASSERT_EQ(result.text().toStdString(), "");
+    std::vector<FoundStudy> found;
+    ASSERT_TRUE(search->studies({}, found).good());
+    EXPECT_EQ(found.size(), 0u);
+    ASSERT_EQ(search->prepare().text().toStdString(), "");
+    ASSERT_TRUE(search->studies({}, found).good());
+    ASSERT_EQ(found.size(), 1u);
+    EXPECT_EQ(found[0].modalities, "CT");
+    EXPECT_TRUE(found[0].attributes.contains("Müller^Eva")) << found[0].attributes.toStdString();
 }
 
 }  // namespace

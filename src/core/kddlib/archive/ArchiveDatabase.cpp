@@ -33,6 +33,7 @@ Result claimStudy(Kxg::Catalogue& catalogue, const QByteArray& studyUID,
                   std::unique_ptr<Kxg::StudyClaim>& claim)
 {
     Result result = catalogue.claim(studyUID, kPatience, claim);
+    // No fault and no claim: somebody else has it still.
     if (result.good() && claim == nullptr)
         result = Result::failure(QStringLiteral("Study %1 is being worked on by another process")
                                      .arg(QString::fromUtf8(studyUID)));

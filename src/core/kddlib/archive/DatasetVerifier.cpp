@@ -21,6 +21,7 @@ QByteArray keyText(const DcmTagKey& key)
     return keyName(key).toLatin1();
 }
 
+/// Group lengths are not kept, and our own group is in no DICOM file: neither can differ.
 bool isKept(const DcmTagKey& key)
 {
     return key.getGroup() != 0 && key.getElement() != 0 && key.getGroup() != 0x0006;
@@ -30,6 +31,7 @@ bool isKept(const DcmTagKey& key)
 bool isOurOwn(const TagMap& map, const DcmTagKey& key)
 {
     constexpr Uint16 kGroup = 0x0071;
+    // The element that reserves the block has no creator itself; its value is the creator's name.
     const char* creator = map.privateCreator(key);
     const TagElement* reserved = map.findElement(key);
     return key.getGroup() == kGroup && (creator != nullptr ? qstrcmp(creator, kOurPrivateCreator) == 0
@@ -66,6 +68,8 @@ public:
 
     int faults() const { return mFaults; }
 
+    /// Walks both sides in key order, so that what one of them lacks is
+    /// noticed when the other one has passed it.
     void verify(DcmItem& item, const TagMap& map, const QByteArray& prefix)
     {
         const TagMap::iterator end = map.end();
@@ -107,6 +111,7 @@ private:
     {
         const QByteArray path = prefix + keyText(sequence.getTag());
         if (held.markedAsOmitted()) {
+            // Only what is longer than the bound may have been left out, so the marker alone proves nothing.
             if (sequence.getLength(EXS_LittleEndianImplicit, EET_UndefinedLength) <= kDefaultValueBound)
                 fault(path, "is left out of the tag file");
             return;
@@ -142,6 +147,7 @@ private:
         }
     }
 
+    /// Both sides by the VR of the tag file, so that they can be compared by eye.
     static QByteArray shown(const TagElement& held, const QByteArray& value)
     {
         QByteArray text;
@@ -179,6 +185,7 @@ int verifyCorrected(const TagMap& expected, const TagMap& image, const Report& r
     for (TagMap::iterator it = expected.begin(); it != expected.end(); ++it) {
         if (!isKept(it.key()))
             continue;
+        // As for a dataset: what the image alone has is found on the way to the next key that is expected.
         for (; held != end && held.key() < it.key(); ++held)
             onlyHeld(held.key());
         if (held == end || held.key() != it.key()) {

@@ -20,6 +20,7 @@ namespace Kdd
 namespace
 {
 
+// Bytes of any content that stand before the prefix.
 constexpr int kPreamble = 128;
 
 DicomInput& refuse(DicomInput& input, DicomInput::Kind kind, const QString& reason)
@@ -36,6 +37,7 @@ bool hasDicomPrefix(const RandomAccessFile& file)
            std::memcmp(prefix, "DICM", 4) == 0;
 }
 
+/// By its class or by what it holds, for the meta information may be missing.
 bool isMediaDirectory(DcmFileFormat& file)
 {
     OFString sopClass;
@@ -72,6 +74,7 @@ bool namesItself(DcmItem& dataset)
            dataset.tagExistsWithValue(DCM_StudyInstanceUID);
 }
 
+/// What the pixels take of the file, to tell how much of it is header.
 qint64 pixelBytes(DcmItem& dataset)
 {
     qint64 bytes = 0;
@@ -88,12 +91,14 @@ qint64 pixelBytes(DcmItem& dataset)
             if (DcmXfer(xfer).isEncapsulated())
                 pixels.getEncapsulatedRepresentation(xfer, parameter, fragments);
         }
+        // Encapsulated pixel data has no length of its own, but its fragments have.
         bytes += fragments != nullptr ? fragments->getLength(xfer, EET_UndefinedLength)
                                       : element->getLengthField();
     }
     return bytes;
 }
 
+/// Makes an image of the dataset, unless its UIDs cannot serve as names.
 DicomInput& take(DicomInput& input, DcmFileFormat& file)
 {
     DcmDataset& dataset = *file.getDataset();
@@ -117,6 +122,7 @@ DicomInput& take(DicomInput& input, DcmFileFormat& file)
     return input;
 }
 
+/// Only the header is read, which tells the study and the series.
 DicomInput& takeVolume(DicomInput& input)
 {
     Result result;
@@ -144,6 +150,8 @@ DicomInput readDicomInput(const QByteArray& path, Damage damage)
     DicomInput input;
     input.path = path;
     FileStatus status;
+    // Before the file is read: one that changes meanwhile has
+    // another stamp at the next scan and is read again.
     if (statusOf(path.constData(), status))
         input.stamp = {status.size, status.modified};
     if (path.size() > Kxg::kMaxPath)
@@ -162,6 +170,8 @@ DicomInput readDicomInput(const QByteArray& path, Damage damage)
     const OFCondition condition = damage == Damage::Refused
                                       ? readDicomFile(path.constData(), format)
                                       : readDamagedDicomFile(path.constData(), format, input.leftOut);
+    // A file with the prefix claims to be DICOM, so that it cannot be
+    // read is a fault. Any other is something else.
     if (condition.bad() || (!isDicom && !namesItself(*format.getDataset())))
         return std::move(refuse(input, isDicom ? DicomInput::Kind::Unusable : DicomInput::Kind::Other,
                                 condition.bad() ? QString::fromLatin1(condition.text())

@@ -42,10 +42,12 @@ Result FileScan::run(const QList<QByteArray>& paths, const std::function<Result(
 Result FileScan::readAll(const QList<QByteArray>& files, const std::function<Result(DicomInput)>& take)
 {
     const unsigned ahead = qMax(1U, std::thread::hardware_concurrency());
+    // Whatever ends this early waits for the reading that is under way: the future of a task joins its thread.
     std::deque<std::future<std::vector<DicomInput>>> running;
     int next = 0;
     qint64 done = 0;
     while (next < files.size() || !running.empty()) {
+        // Bounded, because what was read stands in memory until it is its turn.
         while (next < files.size() && running.size() <= ahead) {
             running.push_back(
                 std::async(std::launch::async, readSome, files.mid(next, kFilesPerTask), mDamage));
@@ -83,6 +85,7 @@ Result FileScan::findChanged(const QList<QByteArray>& paths, QList<QByteArray>& 
                 continue;
             const auto stamp = known.constFind(file);
             FileStatus status;
+            // A file whose status cannot be had counts as changed: reading it tells what is wrong.
             if (stamp != known.cend() && statusOf(file.constData(), status) && status.size == stamp->size &&
                 status.modified == stamp->modified)
                 ++mUnchanged;
@@ -110,6 +113,7 @@ Result FileScan::handOn(DicomInput input, const std::function<Result(DicomInput)
         break;
     case DicomInput::Kind::Volume:
         break;
+    // Handed on as well: the database notes it, so that it is not opened again.
     case DicomInput::Kind::Other:
         ++mSkipped;
         if (mNamesSkipped)

@@ -27,6 +27,8 @@ void collect(const std::filesystem::path& place, QList<QByteArray>& files, QStri
 void collectBelow(const std::filesystem::path& folder, QList<QByteArray>& files, QStringList& faults)
 {
     std::error_code error;
+    // Listed before anything below is entered, so that no more than one folder is open at a time, and
+    // sorted, because file systems list in any order.
     std::vector<std::filesystem::path> entries;
     for (std::filesystem::directory_iterator it(folder, error), end; !error && it != end; it.increment(error))
         entries.push_back(it->path());
@@ -56,6 +58,7 @@ void collect(const std::filesystem::path& place, QList<QByteArray>& files, QStri
 QByteArray absolutePath(const QByteArray& path)
 {
     QByteArray absolute = bytes(std::filesystem::absolute(path.toStdString()).lexically_normal());
+    // A folder is one path, however it was written: what is known of it is asked for by that.
     if (absolute.size() > 1 && absolute.endsWith('/'))
         absolute.chop(1);
     return absolute;
@@ -67,6 +70,7 @@ QList<QByteArray> filesBelow(const QList<QByteArray>& paths, QStringList& faults
     for (const QByteArray& path : paths) {
         const std::filesystem::path place(path.toStdString());
         std::error_code error;
+        // Of the link itself: one that leads nowhere is there, and reading it tells what is wrong.
         if (std::filesystem::exists(std::filesystem::symlink_status(place, error)))
             collect(place, files, faults);
         else

@@ -65,12 +65,14 @@ Result Registration::flush()
     Result registered = mCatalogue.registerFiles(mBatch, outcome);
     if (registered.bad())
         return registered;
+    // By these requests the intake tells later whether anything else waits in a study.
     for (auto it = outcome.requests.cbegin(); it != outcome.requests.cend(); ++it)
         mRequests[it.key()].append(it.value());
     for (const Kxg::FileConflict& conflict : outcome.conflicts)
         warnOf(conflict);
     mImages += static_cast<int>(mBatch.dicom.size());
     mVolumes += static_cast<int>(mBatch.volumes.size());
+    // Let go of only when the database has it, so that a failure leaves everything to be tried again.
     mBatch = {};
     return {};
 }

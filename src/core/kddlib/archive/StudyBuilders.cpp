@@ -21,6 +21,7 @@ BuildTotals StudyBuilders::build(const QVector<QByteArray>& studyUIDs)
     return run(studyUIDs.size(), [&](Kxg::Catalogue& catalogue) { workOnNamed(catalogue, studyUIDs); });
 }
 
+/// Each thread takes the next study when it is done with one, so that a large study holds nobody else up.
 BuildTotals StudyBuilders::run(int expected, const std::function<void(Kxg::Catalogue&)>& work)
 {
     mTotals = {};
@@ -30,6 +31,7 @@ BuildTotals StudyBuilders::run(int expected, const std::function<void(Kxg::Catal
     workers.reserve(static_cast<std::size_t>(mJobs));
     for (int i = 0; i < mJobs; ++i) {
         workers.emplace_back([&] {
+            // Opened inside, for a connection belongs to the thread that opened it.
             if (const std::unique_ptr<Kxg::Catalogue> catalogue = openCatalogue())
                 work(*catalogue);
             else
@@ -45,6 +47,7 @@ void StudyBuilders::workOnQueue(Kxg::Catalogue& catalogue)
 {
     while (!isCancelled()) {
         std::unique_ptr<Kxg::StudyClaim> claim;
+        // What failed goes on waiting, and would be claimed again and again.
         if (!succeeded(catalogue.claimNext(failedStudies(), claim))) {
             fail();
             return;
@@ -72,6 +75,7 @@ void StudyBuilders::build(Kxg::Catalogue& catalogue, Kxg::StudyClaim& claim)
     const CompletedStudy completed = StudyCompletion(catalogue, mOptimize).build(claim);
     const bool isDone = succeeded(completed.result);
     const std::lock_guard<std::mutex> lock(mMutex);
+    // A study that was removed is done, but not built.
     if (isDone) {
         mTotals.studies += completed.isRemoved ? 0 : 1;
         mTotals.images += completed.statistics.images;
@@ -80,6 +84,8 @@ void StudyBuilders::build(Kxg::Catalogue& catalogue, Kxg::StudyClaim& claim)
         ++mTotals.failed;
         mFailedStudies.insert(claim.studyId());
     }
+    // Under the lock, because the observer is promised one call at a time. Others may have put studies into
+    // the queue since they were counted, so the total follows.
     const int done = mTotals.studies + mTotals.failed;
     mObserver.progress(done, qMax(mExpected, done));
 }
@@ -117,6 +123,7 @@ Result requestStale(Kxg::Catalogue& catalogue, bool everything)
     QVector<QByteArray> stale;
     for (const Kxg::StudySummary& study : studies) {
         const QString path = TagFile::cacheFilePathForStudy(study.studyInstanceUID.constData());
+        // What waits is in the queue already. Volume files alone have no tag file.
         if (!study.isWaiting && study.images > 0 && (everything || !isTagFile(path, study.tagFile)))
             stale.append(study.studyInstanceUID);
     }

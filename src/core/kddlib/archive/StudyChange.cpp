@@ -50,6 +50,7 @@ void takeOut(const ArchiveNode& node, TagFile& file)
         file.clear();
 }
 
+/// Says what there is not, by the innermost of the names that were given.
 Result absent(const ArchiveNode& node)
 {
     const QString study = QString::fromUtf8(node.study);
@@ -86,6 +87,7 @@ Result removeUnregistered(const ArchiveNode& node)
 Result StudyChange::remove(const ArchiveNode& node)
 {
     QVector<QByteArray> registered;
+    // One is enough: before all UIDs that it begins comes the UID itself.
     Result found = mCatalogue.findStudies(node.study, 1, registered);
     if (found.bad())
         return found;
@@ -107,10 +109,13 @@ Result StudyChange::removeRegistered(const ArchiveNode& node)
     if (!isWholeStudy && !isListed(node, contents) &&
         !(present.readWhenFreeForStudy(node.study.constData(), false) && isHeld(node, present)))
         return absent(node);
+    // The database first: whatever dies from here on leaves a study that waits to be completed.
     result = forget(node);
     if (result.bad())
         return result;
     StudyCompletion completion(mCatalogue);
+    // What had changed before this removal is not in the tag file yet,
+    // so taking images out of that would not do.
     return (contents.changes.isEmpty() ? completion.reduce(*claim) : completion.build(*claim)).result;
 }
 
@@ -141,6 +146,7 @@ Result StudyChange::synchronise(const QByteArray& studyUID, TagFile& file)
         result = mCatalogue.studyContents(studyUID, contents);
     if (result.bad())
         return result;
+    // Before the file is written further down, which makes it another one.
     const bool isStale = !isTagFile(TagFile::cacheFilePathForStudy(studyUID.constData()), contents.tagFile);
     if (!file.readAndSync(studyUID.constData(), nullptr))
         return unchanged(studyUID, file);

@@ -41,6 +41,7 @@ QString reasonOf(const QString& path, const TagFile& tried)
         return QStringLiteral("has no tag file");
     if (presence == FilePresence::Empty)
         return QStringLiteral("has an empty tag file, %1").arg(path);
+    // Without asking for the study: the file may be a sound one of another study.
     TagFile any;
     if (any.readCacheFile(path, nullptr, false))
         return QStringLiteral("has a tag file, %1, that holds study %2")
@@ -97,11 +98,13 @@ void StudyCheck::checkAll()
         check(study.studyInstanceUID);
         known.insert(TagFile::cacheFilePathForStudy(study.studyInstanceUID.constData()));
     }
+    // Tag files that no study of the database accounts for.
     QStringList others;
     QStringList faults;
     const QString meta = pathText(TagFile::metaFolder());
     const QByteArray folder = absolutePath(TagFile::metaFolder());
     for (const QByteArray& file : filesBelow({folder}, faults)) {
+        // In the form in which the studies' own paths are noted, however the folder was named.
         const QString path = meta + pathText(file.mid(folder.size() + 1));
         if (file.endsWith(".tc") && !known.contains(path))
             others.append(path);
@@ -153,6 +156,8 @@ bool StudyCheck::read(const QByteArray& studyUID, TagFile& file)
     return false;
 }
 
+/// Of a study that does not wait. While one waits, its tag file may differ from
+/// the database, and the build will mend that.
 void StudyCheck::checkListing(const QByteArray& studyUID, const TagFile& file)
 {
     const QString study = textOf(studyUID);
@@ -193,6 +198,7 @@ void StudyCheck::checkVolumes(const QByteArray& studyUID, const TagFile& file)
             const QByteArray name =
                 volume->volumeFileName().isEmpty() ? volume->fileNameSuffix() : volume->volumeFileName();
             const auto& paths = mContents.volumes;
+            // Each file answers for one volume: two of the same suffix need two files.
             const auto path = std::find_if(paths.begin(), paths.end(), [&](const QByteArray& each) {
                 return !found.contains(each) && isVolumeOf(*volume, each);
             });
@@ -233,6 +239,8 @@ void StudyCheck::checkImage(const QByteArray& key, const TagMap& image)
     const auto report = [&](const QByteArray& attribute, const QByteArray& what) {
         mReport(QStringLiteral("Image %1: %2 %3").arg(textOf(key), textOf(attribute), textOf(what)));
     };
+    // A corrected image differs from its file on purpose: it is held
+    // against the file with the corrections on top.
     std::unique_ptr<TagMap> expected;
     if (mContents.isCorrected)
         expected.reset(TagMap::createTagMap(dicom.getDataset(), kDefaultValueBound));

@@ -65,9 +65,11 @@ CompletedStudy StudyCompletion::reduce(Kxg::StudyClaim& claim)
     // The removal itself has left one request.
     if (mContents.changes.size() > 1 || !isTrusted(studyUID) ||
         !present.readWhenFreeForStudy(studyUID.constData(), true) || !holdsListed(TagFile(), present)) {
+        // Held alone so far; the build takes the lock itself.
         present.close();
         return build(claim, TagFile());
     }
+    // Whatever is not listed goes, so that a removal that died half way is completed as well.
     const std::vector<QByteArray> gone = unlisted(present);
     std::vector<const char*> keys;
     keys.reserve(gone.size());
@@ -101,6 +103,7 @@ Result StudyCompletion::readContents(Kxg::StudyClaim& claim)
     return result;
 }
 
+/// The file goes first: whatever dies in between leaves a study that waits.
 CompletedStudy StudyCompletion::remove(Kxg::StudyClaim& claim)
 {
     Result result = TagFileGenerator::removeTagFile(claim.studyInstanceUID());
@@ -109,10 +112,13 @@ CompletedStudy StudyCompletion::remove(Kxg::StudyClaim& claim)
     return {result, result.good(), {}};
 }
 
+/// What is loaded already spares the build the reading of those files.
 CompletedStudy StudyCompletion::build(Kxg::StudyClaim& claim, const TagFile& loaded) const
 {
     TagFile whole;
     const QByteArray& studyUID = claim.studyInstanceUID();
+    const bool isTrustedStamp =
+        isTagFile(TagFile::cacheFilePathForStudy(studyUID.constData()), mContents.tagFile);
     TagFileGenerator generator(nullptr, mOptimize);
     if (!generator.createTagFile(whole, claim.studyId(), studyUID.constData(), loaded))
         return failed("The tag file of study %1 is not built", studyUID,
@@ -121,6 +127,8 @@ CompletedStudy StudyCompletion::build(Kxg::StudyClaim& claim, const TagFile& loa
     Kxg::BuiltStudy built = builtStudy(whole);
     const int numUnread = generator.numKept() + generator.numMissing();
     built.isComplete = numUnread == 0;
+    // Nothing has changed but the order of what arrived.
+    built.isOnlyRearranged = mContents.changes.isEmpty() && isTrustedStamp;
     Result result = claim.finish(built);
     if (result.good() && numUnread > 0)
         return failed("Study %1 is built, but goes on waiting", studyUID,
@@ -142,6 +150,8 @@ bool StudyCompletion::canMerge(const QByteArray& studyUID, const TagFile& arriva
     // A file of the same path and image may have been registered with other content.
     const bool isAlone = std::all_of(mContents.changes.begin(), mContents.changes.end(),
                                      [&](qint64 request) { return requests.contains(request); });
+    // What costs least is asked first: whether the tag file is the one written last, and what it holds, only
+    // when nothing else speaks against merging.
     return isAlone && arrivals.studyInstanceUID() == studyUID && isTrusted(studyUID) &&
            present.readWhenFreeForStudy(studyUID.constData(), false) && holdsListed(arrivals, present) &&
            std::all_of(arrivals.imagesByUID().keyBegin(), arrivals.imagesByUID().keyEnd(),
@@ -171,8 +181,10 @@ std::vector<QByteArray> StudyCompletion::unlisted(const TagFile& present) const
     return keys;
 }
 
+/// Tried again only while others hold the file; any other fault would be the same the next time.
 CompletedStudy StudyCompletion::merge(Kxg::StudyClaim& claim, TagFile& arrivals, TagFile& present)
 {
+    // Previews are chosen among all images of the study, so what is there goes along.
     TagFileGenerator().completeArrivals(arrivals, present);
     bool isMerged = arrivals.mergeIntoCacheFile();
     for (int i = 1; i < kMergeAttempts && !isMerged && arrivals.wasLockedOut(); ++i)

@@ -37,6 +37,7 @@ Result StudyIntake::place(DicomInput& input)
 {
     PendingStudy& study = mPending[input.studyUID];
     const QByteArray& path = input.path;
+    // Counted by what the study grows: a second file of an image takes the place of the first.
     const int before = study.file.imagesByUID().size();
     if (TagFileGenerator::place(study.file, std::move(input.map), path) == nullptr) {
         LogFile::errorf("Could not take %s: it belongs nowhere", path.constData());
@@ -49,6 +50,7 @@ Result StudyIntake::place(DicomInput& input)
     study.lastTouched = ++mClock;
     study.fileBytes += input.fileBytes;
     study.headerBytes += input.headerBytes;
+    // Files of one study mostly come together, so the one that was left alone longest is likely complete.
     return mPendingImages <= kMaxPendingImages ? Result() : writeLongestUntouched();
 }
 
@@ -59,8 +61,11 @@ Result StudyIntake::writeLongestUntouched()
     }));
 }
 
+/// Completes a study and lets go of what was gathered of it, whatever
+/// comes of that: what fails waits in the queue.
 Result StudyIntake::write(Pending::iterator study)
 {
+    // Registered before its tag file is touched: what dies on the way leaves a study that waits.
     Result registered = mRegistration.flush();
     if (registered.bad())
         return registered;
@@ -93,6 +98,7 @@ Result StudyIntake::finish()
     return {};
 }
 
+/// With what has arrived; without arrivals from all files of the study.
 void StudyIntake::complete(const QByteArray& studyUID, PendingStudy* arrivals)
 {
     mCompleted.insert(studyUID);
@@ -124,6 +130,7 @@ void StudyIntake::complete(const QByteArray& studyUID, PendingStudy* arrivals)
 
 Result StudyIntake::completeWaiting(const QList<QByteArray>& paths)
 {
+    // Once for each study, though several paths may lead to its files.
     QSet<QByteArray> waiting;
     for (const QByteArray& path : paths) {
         QVector<QByteArray> studies;

@@ -49,10 +49,13 @@ bool StudyStacker::stack(const QByteArray& studyUID)
     std::unique_ptr<Kxg::StudyClaim> claim;
     if (!succeeded(claimStudy(mCatalogue, studyUID, claim)))
         return false;
+    // What was made or removed is built in, also when another
+    // series failed: the database knows of it already.
     const bool isDone = run();
     return (!mIsChanged || succeeded(StudyCompletion(mCatalogue).build(*claim).result)) && isDone;
 }
 
+/// A series that fails does not keep the others from being stacked; what was made is registered in any case.
 bool StudyStacker::run()
 {
     removeUnfinished();
@@ -102,6 +105,7 @@ bool StudyStacker::stackSeries(const QByteArray& seriesUID, const TagMap& series
             isDone = false;
             continue;
         }
+        // Numbers without gaps, because the volumes that were made here are found again by counting up.
         ++index;
         told.volumes.append(QString::asprintf("%d x %d x %d at %.4g mm", stack.dims.x, stack.dims.y,
                                               stack.dims.z, stack.sliceSpacing));
@@ -119,6 +123,7 @@ bool StudyStacker::clearSeries(const QByteArray& seriesUID, const TagMap& series
     isStacked = ours.isEmpty() ? !series.volumes().isEmpty() : !mOptions.again;
     if (ours.isEmpty() || isStacked)
         return true;
+    // The database first, so that it does not list files that are gone.
     if (!succeeded(mCatalogue.removeFiles(ours)))
         return false;
     mIsChanged = true;

@@ -22,9 +22,11 @@ namespace Kdd
 namespace
 {
 
+// Tag and length. Encapsulated pixel data is little-endian in every file.
 constexpr qint64 kItemHeaderSize = 8;
 constexpr unsigned char kItemTag[] = {0xfe, 0xff, 0x00, 0xe0};
 
+/// Null when the pixel data are not encapsulated, or when there are none.
 DcmPixelSequence* fragmentsOf(DcmFileFormat& file)
 {
     DcmElement* pixelData = nullptr;
@@ -79,6 +81,7 @@ bool locateFirstFragment(const char* path, DcmFileFormat& file, FragmentLocation
     RandomAccessFile bytes;
     if (bytes.open(path).bad() || !hasItem(bytes, table, tableLength) || !hasItem(bytes, fragment, length))
         return false;
+    // Two items are the table of offsets and one fragment.
     location = {fragment + kItemHeaderSize, length, sequence->card() == 2};
     return true;
 }

@@ -28,10 +28,12 @@ bool isOk(KxCurlDownloadStream& stream, const char* url)
     return status.ok();
 }
 
+/// What opening an object and opening a range have in common; `open` makes the request.
 template <typename Opening>
 int openStream(const char* url, void** handle, const Opening& open)
 {
     auto stream = std::make_unique<KxCurlDownloadStream>(open(KxCurlClient::instance()));
+    // Only an opened stream is handed out: on failure the caller's handle stays as it was.
     if (!isOk(*stream, url))
         return KDD_STREAM_FAILED;
     *handle = stream.release();
@@ -41,6 +43,7 @@ int openStream(const char* url, void** handle, const Opening& open)
 /// How many bytes came into the block; -1 when the transfer has failed.
 std::streamsize readBlock(UserInfo& info, const char* url)
 {
+    // A transfer that failed has nothing more to give, however often it is asked.
     if (!isOk(info.stream, url))
         return -1;
     const std::streamsize count =
@@ -114,6 +117,7 @@ int ReadDicomFromUrl(const char* url, void* userInfo, uint32_t* length, const ch
         if (!isGiven(function, "the length", length) || !isGiven(function, "the data", data) ||
             !isGiven(function, "the last flag", isLast))
             return KDD_NOT_READ;
+        // Set at once, so that whoever forgets to look at the result finds nothing to read.
         *length = *isLast = 0;
         *data = nullptr;
         if (!isGiven(function, "the user info", userInfo) || (isFirst && !isGiven(function, "the URL", url)))
@@ -147,5 +151,6 @@ bool DeleteObject(const char* url)
 
 bool StringIsUrl(const char* text)
 {
+    // Takes null and throws nothing, so there is nothing to guard.
     return KxCurlClient::isUrl(text);
 }

@@ -36,6 +36,7 @@ void configureLogging(int flags, const char* databaseServer)
         LogFile::printf("Configure logging: debug=%d timings=%d", 1, hasTimings ? 1 : 0);
 }
 
+/// Tells a study that has no tag file from one whose file cannot be read.
 bool isThere(const QString& path)
 {
     FileStatus status;
@@ -48,6 +49,7 @@ using Removal = int (TagFile::*)(int count, const char** uids);
 bool removeFrom(const char* studyUID, int count, const char** uids, Removal removal, const char* what)
 {
     TagFile file;
+    // Held from the reading to the writing, so that no change of others is lost.
     if (!file.readCacheFileForStudy(studyUID, true)) {
         if (isThere(TagFile::cacheFilePathForStudy(studyUID)))
             LogFile::errorf("Could not remove %s from the tag file of study %s: %s", what, studyUID,

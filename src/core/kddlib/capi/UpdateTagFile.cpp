@@ -43,6 +43,7 @@ void removeStaleEntries(const QList<QByteArray>& names)
     }
 }
 
+/// Bytes are in the encoding that their declaration names; a wide text is in none any more.
 bool parse(const QByteArray& xml, QAData& job, QString& message)
 {
     return job.parse(xml, message);
@@ -61,6 +62,7 @@ bool applyJob(const Xml& jobXml, QAData& job)
         return fail("Error reading UPQ job XML", message);
     if (!TagFile::applyQA(job, message))
         return fail("Error updating tag file", message);
+    // Only when the correction is done: before that the entries are not stale.
     removeStaleEntries(job.cacheEntries);
     return true;
 }
@@ -129,6 +131,7 @@ bool UpdateTagFileW(const wchar_t* jobXml, const wchar_t* studyUID, int count, c
                     const wchar_t** cacheEntries)
 {
     return guarded(__func__, false, [&](const char* function) {
+        // These own the bytes that the pointers below lead to, for as long as the job runs.
         const QByteArray study = narrow(studyUID);
         NarrowTexts narrowImages(count, images);
         NarrowTexts narrowEntries(count, cacheEntries);

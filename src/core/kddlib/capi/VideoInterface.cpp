@@ -22,6 +22,7 @@ namespace
 {
 
 const QByteArray kCompressedSyntaxes = QByteArrayLiteral("1.2.840.10008.1.2.4.");
+// MPEG-2 comes first, HEVC last; below are the syntaxes of still images.
 constexpr int kFirstVideoSyntax = 100;
 constexpr int kLastVideoSyntax = 108;
 
@@ -54,11 +55,13 @@ Result readVideo(const char* path, VideoMetaInfo& info)
         return Result::failure(QString::fromUtf8(condition.text()));
     OFString uid;
     file.getDataset()->findAndGetOFString(DCM_SOPInstanceUID, uid);
+    // The caller's buffer has room for the longest UID that DICOM allows, and no more.
     if (uid.size() >= KDD_UID_SIZE)
         return Result::failure(QStringLiteral("SOP Instance UID is longer than 64 characters: ") +
                                QString::fromUtf8(uid.c_str()));
     info.sopInstanceUID = uid.c_str();
     file.getDataset()->findAndGetSint32(DCM_CineRate, info.cineRate);
+    // Only then is the video looked for, which reads the file once more.
     info.transferSyntax = videoSyntaxOf(file);
     if (info.transferSyntax == 0 || !locateFirstFragment(path, file, info.location))
         return Result::failure(QStringLiteral("it holds no video"));

@@ -49,10 +49,12 @@ bool extractUIDs(const char* path, QByteArray& sopUID, QByteArray& studyUID)
 {
     std::string_view rest;
     if (removeExtension(path, rest)) {
+        // Without an underscore nothing is left, and nothing names no folder.
         const std::size_t underscore = rest.rfind('_');
         rest = rest.substr(0, underscore != std::string_view::npos ? underscore : 0);
         const std::string_view name = lastName(rest);
         rest.remove_suffix(name.size());
+        // A separator alone is the root, which has no name to be a study's UID.
         if (rest.size() > 1) {
             rest.remove_suffix(1);
             assign(sopUID, name);

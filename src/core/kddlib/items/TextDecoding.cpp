@@ -22,6 +22,7 @@ const char* const kDelimiters = "\\^=";
 
 const char* const kUtf8CharacterSet = "ISO_IR 192";
 
+/// An escape sequence may switch to a set whose characters are bytes of ASCII, so it counts as none.
 bool isAscii(const QByteArray& bytes)
 {
     return std::all_of(bytes.begin(), bytes.end(),
@@ -56,6 +57,8 @@ bool decodeJapanese(const QByteArray& bytes, const QByteArray& characterSet, QSt
     return characterSet.contains("IR 13") && decodeWith("Shift_JIS", bytes, text);
 }
 
+/// What is declared comes first, then what Japanese files write beyond it. UTF-8 comes before Latin-1 because
+/// bytes of another set hardly ever are valid UTF-8, while Latin-1 explains any bytes.
 QString decodePart(const QByteArray& bytes, const QByteArray& characterSet)
 {
     QString text;
@@ -99,6 +102,7 @@ void forItems(DcmItem& item, Visit visit)
     }
 }
 
+/// At any depth, for one such item is enough.
 bool itemsDeclareCharacterSets(DcmItem& item)
 {
     bool found = false;
@@ -108,31 +112,19 @@ bool itemsDeclareCharacterSets(DcmItem& item)
     return found;
 }
 
-bool convertElement(DcmElement& element, const QByteArray& characterSet)
-{
-    char* text = nullptr;
-    if (!DcmVR(element.getVR()).isaString() || element.getString(text).bad() || text == nullptr)
-        return false;
-    const QByteArray bytes(text);
-    if (isAscii(bytes))
-        return false;
-    const QByteArray converted = decodeText(bytes, characterSet).toUtf8();
-    element.putString(converted.constData());
-    return converted != bytes;
-}
-
 /// Value by value, so that one that does not fit leaves the others right. Whether anything has changed.
 bool convertItem(DcmItem& item, const OFString& inherited)
 {
     OFString characterSet;
+    // An item without a character set of its own has that of the item or dataset around it.
     if (!declaresCharacterSet(item, characterSet))
         characterSet = inherited;
     bool hasChanged = false;
     for (DcmObject* object = item.nextInContainer(nullptr); object != nullptr;
          object = item.nextInContainer(object)) {
         if (object->ident() != EVR_SQ)
-            hasChanged |=
-                convertElement(static_cast<DcmElement&>(*object), QByteArray::fromStdString(characterSet));
+            hasChanged |= convertValueToUtf8(static_cast<DcmElement&>(*object),
+                                             QByteArray::fromStdString(characterSet));
     }
     forItems(item, [&](DcmItem& below) { hasChanged |= convertItem(below, characterSet); });
     return hasChanged;
@@ -178,13 +170,30 @@ bool convertValuesToUtf8(DcmItem& dataset)
 {
     if (!convertItem(dataset, OFString()))
         return false;
+    // Declared last: until then each value was explained by the set of its item.
     dataset.putAndInsertString(DCM_SpecificCharacterSet, kUtf8CharacterSet);
     declareUtf8InItems(dataset);
     return true;
 }
 
+/// Binary values and empty ones never change.
+bool convertValueToUtf8(DcmElement& element, const QByteArray& characterSet)
+{
+    char* text = nullptr;
+    if (!DcmVR(element.getVR()).isaString() || element.getString(text).bad() || text == nullptr)
+        return false;
+    const QByteArray bytes(text);
+    if (isAscii(bytes))
+        return false;
+    const QByteArray converted = decodeText(bytes, characterSet).toUtf8();
+    element.putString(converted.constData());
+    return converted != bytes;
+}
+
 void declareUtf8(DcmItem& dataset)
 {
+    // ASCII is UTF-8 already: only the declaration changes, and not where
+    // DCMTK does not know the one that is there.
     if (dataset.convertToUTF8().good())
         declareUtf8InItems(dataset);
 }

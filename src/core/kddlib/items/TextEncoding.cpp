@@ -51,6 +51,8 @@ bool isAscii(const QString& text)
                        [](QChar c) { return c.unicode() < 0x80 && c.unicode() != 0x1b; });
 }
 
+/// By the end of the name, which a set has in common with and without code extensions. The
+/// underscore of "ISO_IR" counts as a blank.
 const CharacterSet* findCharacterSet(QByteArray name)
 {
     name.replace('_', ' ');
@@ -62,6 +64,7 @@ const CharacterSet* findCharacterSet(QByteArray name)
     return found != std::end(kCharacterSets) ? found : nullptr;
 }
 
+/// Empty where Qt lacks the codec; no text that has to be written is read back from that.
 QByteArray encodedWith(const CharacterSet& set, bool isFirst, const QString& text)
 {
     const QTextCodec* codec = QTextCodec::codecForName(set.codec);
@@ -86,6 +89,8 @@ bool encodePart(const QString& part, const QByteArray& characterSet, QByteArray&
         const CharacterSet* set = findCharacterSet(names.at(i).trimmed());
         if (set == nullptr)
             continue;
+        // Where the first value is empty it stands for ASCII, which
+        // was tried above; all others are switched to.
         bytes = encodedWith(*set, i == 0, part);
         if (decodeText(bytes, characterSet) == part)
             return true;
@@ -105,6 +110,8 @@ bool encodeText(const QString& text, const QByteArray& characterSet, QByteArray&
     QByteArray all;
     QByteArray part;
     int start = 0;
+    // Part by part, because each begins in the first character set
+    // again, whatever the one before was switched to.
     for (int i = 0; i <= text.size(); ++i) {
         if (i < text.size() && !isDelimiter(text.at(i)))
             continue;
@@ -115,6 +122,7 @@ bool encodeText(const QString& text, const QByteArray& characterSet, QByteArray&
             all += static_cast<char>(text.at(i).unicode());
         start = i + 1;
     }
+    // As a whole once more: a two-byte set that one part switches to would hide the delimiters behind it.
     if (decodeText(all, characterSet) != text)
         return false;
     bytes = all;

@@ -34,6 +34,7 @@ ItemOF::ItemOF(std::shared_ptr<DcmDataset> dataset)
 {
 }
 
+/// Asks for the form in which the pixels were read; a decoder may have added another one since.
 bool ItemOF::isEncapsulated()
 {
     DcmPixelData* pixels = findPixelData(*mItem);
@@ -129,6 +130,7 @@ OFCondition ItemOF::findAndGetSequence(const DcmTagKey& key, SequenceOfItems*& s
     OFCondition condition = mItem->findAndGetSequence(key, found);
     if (condition.bad())
         return condition;
+    // Asked for a second time, the same object is handed out, which callers rely on.
     auto at = std::find_if(mSequences.begin(), mSequences.end(),
                            [found](const auto& held) { return held->dcmSequence() == found; });
     if (at == mSequences.end())

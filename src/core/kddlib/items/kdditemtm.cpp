@@ -88,6 +88,7 @@ std::unique_ptr<TagElement> newElement(VrCode vr, const QByteArray& text)
     return element;
 }
 
+/// US where the dictionary leaves the sign open: texts are converted to numbers that have one or have none.
 VrCode dictionaryVr(const DcmTagKey& key)
 {
     const DcmEVR evr = DcmTag(key).getEVR();
@@ -162,6 +163,7 @@ OFCondition ItemTM::findAndGetOFString(const DcmTagKey& key, OFString& value)
     const std::unique_ptr<DcmElement> copy = elementForText(*element, key);
     if (copy == nullptr || copy->getOFString(value, 0).bad()) {
         value = textForm(*element);
+        // Without a backslash the position is larger than any text.
         value.resize(std::min(value.find('\\'), value.size()));
     }
     return EC_Normal;
@@ -200,6 +202,7 @@ OFCondition ItemTM::findAndGetUint16(const DcmTagKey& key, Uint16& value)
         return EC_TagNotFound;
     if (element->value().size() < 2)
         return EC_ValueRepresentationViolated;
+    // By its bits: a signed value comes out as it does from a dataset.
     value = qFromLittleEndian<quint16>(element->value().constData());
     return EC_Normal;
 }
@@ -233,6 +236,7 @@ OFCondition ItemTM::findAndGetSequence(const DcmTagKey& key, SequenceOfItems*& s
     if (!element->isSequence())
         return EC_InvalidVR;
     auto* found = static_cast<TagSequence*>(element);
+    // As for a dataset: asked for a second time, the same object is handed out.
     auto at = std::find_if(mSequences.begin(), mSequences.end(),
                            [found](const auto& held) { return held->tagSequence() == found; });
     if (at == mSequences.end())
@@ -272,6 +276,7 @@ Item* SequenceOfItemsTM::getItem(unsigned int index)
         return nullptr;
     if (mItems.size() <= index)
         mItems.resize(index + 1U);
+    // Made when it is first asked for, and kept: callers are promised the same pointer.
     std::shared_ptr<ItemTM>& item = mItems[index];
     if (item == nullptr)
         item = std::make_shared<ItemTM>(*mSequence->item(static_cast<int>(index)));

@@ -101,6 +101,7 @@ struct KDD_LOCAL KxCurlClient::Private
 KxCurlDownloadStream KxCurlClient::Private::open(KxCurlDownloadRequest::Origin origin,
                                                  std::optional<ByteRange> firstRange) const
 {
+    // One for each stream: its requests are driven together, by whoever reads it.
     origin.multi = std::make_shared<KxCurlDownloadRequest::MultiMap>(handles);
     origin.share = &share;
     const int concurrent = currentSettings().numConcurrentRequestsPerFile;
@@ -124,6 +125,7 @@ KxCurlDownloadStream KxCurlClient::Private::get(const std::function<PreparedRequ
     return open(std::move(origin), firstRange);
 }
 
+/// In one piece, because an answer to a body is no object that could be asked for by ranges.
 QJsonDocument KxCurlClient::Private::post(const std::function<PreparedRequest()>& prepare,
                                           const QByteArray& body, KxHttpStatus& status) const
 {
@@ -138,7 +140,9 @@ QJsonDocument KxCurlClient::Private::post(const std::function<PreparedRequest()>
 KxCurlClient::KxCurlClient()
 {
     setUpCurl();
+    // Only now: its members make handles.
     mPrivate = new Private;
+    // The client is never destroyed, so it may be kept.
     mPrivate->settings.authorization = [this] {
         return mPrivate->googleAuthentication.authorizationHeader(*this).toStdString();
     };
@@ -246,6 +250,7 @@ KxCurlDownloadStream KxCurlClient::readFollowing(const std::string& url, qint64 
     if (!range && start > 0)
         headers.push_back("Range: bytes=" + std::to_string(start) + '-');
     std::optional<Redirects> redirects;
+    // Each round is a request of its own, to where the answer before it led.
     for (;;) {
         const auto prepare = [=] {
             const ClientSettings settings = mPrivate->currentSettings();
@@ -260,6 +265,7 @@ KxCurlDownloadStream KxCurlClient::readFollowing(const std::string& url, qint64 
         if (redirects->follow(stream.httpStatus(), result))
             continue;
         if (result.bad())
+            // The stream is told, for its reader asks that and nobody else what became of the transfer.
             static_cast<KxCurlDownloadStreambuf*>(stream.rdbuf())
                 ->currentRequest()
                 ->fail(result.text().toStdString());

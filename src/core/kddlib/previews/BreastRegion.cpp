@@ -31,6 +31,7 @@ bool isWhite(const QImage& picture, const QRect& line)
     return true;
 }
 
+/// Bounded on each side, so that a picture that is white all over still has a middle.
 QRect withoutWhiteFrame(const QImage& picture)
 {
     QRect inner = picture.rect();
@@ -114,6 +115,7 @@ int splitLevel(const QVector<quint8>& pixels)
         if (darkCount == 0 || brightCount == 0)
             continue;
         const double contrast = (total - darkSum) / brightCount - darkSum / darkCount;
+        // But for a constant factor the variance between the two classes.
         const double spread = contrast * contrast * darkCount * brightCount;
         if (contrast >= kLeastContrast && spread > best) {
             best = spread;
@@ -129,6 +131,7 @@ enum class Keep { All, Any };
 /// counts: the breast goes on there.
 void filterLine(quint8* pixels, int step, int count, int radius, Keep keep)
 {
+    // Sums up to each pixel: how many are set in a window is then one subtraction, whatever its radius.
     QVector<int> before(count + 1, 0);
     for (int i = 0; i < count; ++i)
         before[i + 1] = before.at(i) + pixels[i * step];
@@ -140,6 +143,7 @@ void filterLine(quint8* pixels, int step, int count, int radius, Keep keep)
     }
 }
 
+/// First along the rows, then along the columns: together the square of that radius around each pixel.
 void filter(QVector<quint8>& mask, const QSize& size, int radius, Keep keep)
 {
     for (int y = 0; y < size.height(); ++y)
@@ -158,6 +162,7 @@ QVector<int> takeArea(QVector<quint8>& mask, int width, int start)
         const int neighbours[] = {at % width > 0 ? at - 1 : -1, at % width < width - 1 ? at + 1 : -1,
                                   at - width, at + width};
         for (const int neighbour : neighbours) {
+            // Beyond the first and the last row value() answers 0, as it does for -1.
             if (mask.value(neighbour, 0) == 0)
                 continue;
             mask[neighbour] = 0;
@@ -172,6 +177,7 @@ QVector<int> takeArea(QVector<quint8>& mask, int width, int start)
 BreastRegion::BreastRegion(const QImage& picture)
     : mFrame(withoutWhiteFrame(picture))
 {
+    // Inside the frame, because the border that tells the background is that of the picture itself.
     const auto levels = brightnessLevels(isInverted(picture, mFrame));
     mMask.reserve(mFrame.width() * mFrame.height());
     for (int y = mFrame.top(); y <= mFrame.bottom(); ++y) {
@@ -195,6 +201,7 @@ void BreastRegion::cutBridges(int radius)
     filter(mMask, mFrame.size(), radius, Keep::Any);
 }
 
+/// Takes every area out of the mask and puts the largest back, unless that is too small to be a breast.
 void BreastRegion::keepLargestArea()
 {
     QVector<int> largest;
@@ -228,6 +235,7 @@ void BreastRegion::findBox()
     mBox = QRect(QPoint(left, mBox.top()), QPoint(right, mBox.bottom()));
 }
 
+/// A row or a column; `step` is how far its pixels lie apart in the mask.
 BreastRegion::Line BreastRegion::line(int start, int step, int count) const
 {
     Line line;

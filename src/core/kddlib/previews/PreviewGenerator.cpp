@@ -21,9 +21,11 @@ namespace
 {
 
 constexpr float kNoTensor = 0.001F;  // marks pixels of a tensor image where none was measured
+// Six floats.
 constexpr int kTensorBytes = 24;
 constexpr float kVeryLarge = 1e10F;
 
+/// What is too large for an int would wrap to a negative bound, which stands for none.
 int toInt(unsigned long size)
 {
     return static_cast<int>(std::min<unsigned long>(size, std::numeric_limits<int>::max()));
@@ -48,6 +50,7 @@ class Window
 public:
     Window(float lowest, float highest)
         : mLowest(lowest)
+        // A range of one value has no steps: all of it is black.
         , mScale(highest == lowest ? 0 : 255 / (highest - lowest))
     {
     }
@@ -76,6 +79,7 @@ private:
 template <typename T, typename Convert>
 void convertPixels(const KxVolumeInfo& info, QImage& image, Convert convert)
 {
+    // By the bytes of a pixel, which may have more numbers than are shown.
     const int step = info.bytesPerPixel() / static_cast<int>(sizeof(T));
     for (int y = 0; y < image.height(); ++y) {
         const T* from = reinterpret_cast<const T*>(info.pixels() + y * info.rowStride());
@@ -270,7 +274,9 @@ QImage PreviewGenerator::convertToQImage(const KxVolumeInfo* info, float center,
     QImage image(info->width(), info->height(), QImage::Format_RGB32);
     if (converter == nullptr || image.isNull())
         return {};
+    // Pixels of too few numbers are not converted and stay as they are here.
     image.fill(Qt::black);
+    // A negative width has white at the low end.
     const float half = (info->isInverted() ? -width : width) * 0.5F;
     converter(*info, Window(center - half, center + half), image);
     return image;

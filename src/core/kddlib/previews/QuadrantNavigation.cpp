@@ -91,6 +91,8 @@ Side sideTowards(const QByteArray& patientOrientation, char direction, char oppo
     return Side::Unknown;
 }
 
+/// Pictures from the side have the head's. Seen from above there is none, and the outer half takes its place,
+/// which for the left breast lies to the left of the patient.
 Side upperSide(const Orientation& orientation, const QByteArray& patientOrientation)
 {
     switch (orientation.view) {
@@ -141,6 +143,8 @@ QByteArray firstOf(const QByteArray& first, const QByteArray& second)
     return first.isEmpty() ? second : first;
 }
 
+/// Image Laterality is the image's own, Laterality that of the series. A tomosynthesis may have neither:
+/// its frames share what their anatomy says.
 QByteArray lateralityOf(const TagMap& image)
 {
     QByteArray laterality =
@@ -167,12 +171,14 @@ Side chestWallOf(const BreastRegion& breast, Laterality laterality)
                             breast.row(0).count, breast.row(breast.frame().height() - 1).count};
     const auto* const longest = std::max_element(std::begin(contacts), std::end(contacts));
     if (*longest > 0)
+        // The contacts stand in the order of the sides, which begin after Unknown.
         return static_cast<Side>(longest - contacts + 1);
     if (laterality == Laterality::Unknown)
         return Side::Unknown;
     return laterality == Laterality::Left ? Side::Left : Side::Right;
 }
 
+/// The mean position of all pixels of the breast, row by row.
 QPointF centreOf(const BreastRegion& breast)
 {
     double count = 0;
@@ -187,6 +193,7 @@ QPointF centreOf(const BreastRegion& breast)
     return {sumX / count, sumY / count};
 }
 
+/// The middle of the row or column of the breast that lies farthest from the chest wall.
 QPointF tipOf(const BreastRegion& breast, Side chestWall)
 {
     const QRect& box = breast.box();
@@ -229,6 +236,7 @@ QuadrantNavigation::Orientation QuadrantNavigation::checkOrientation(const TagMa
 
 QuadrantNavigation::Orientation QuadrantNavigation::checkOrientation(const ParamBundle& dicom)
 {
+    // The bundle holds single attributes and no sequences, so there is no view code.
     return orientationOf({firstOf(textOf(dicom, "G0020-0062"), textOf(dicom, "G0020-0060")),
                           textOf(dicom, "G0018-5101"), QByteArray(), textOf(dicom, "G0020-0020")});
 }
@@ -253,6 +261,7 @@ QVector<float> QuadrantNavigation::computeImageBoxAndCenter(const QImage& previe
     };
     const QPointF middleOfPixel(0.5, 0.5);
     addPosition(breast.box().topLeft());
+    // The last pixel inside is part of the breast as a whole, so its far edge counts.
     addPosition(breast.box().bottomRight() + QPoint(1, 1));
     addPosition(centreOf(breast) + middleOfPixel);
     addPosition(tipOf(breast, chestWall) + middleOfPixel);

@@ -32,6 +32,7 @@ const Volume* largestVolume(const QList<TagMap*>& series)
     return largest;
 }
 
+/// The image that a volume's preview shows: it is made of the middle slice.
 TagMap* middleImage(const Volume& volume)
 {
     int frame = 0;
@@ -58,6 +59,7 @@ QByteArray TagMap::findPreviewData(TagMap** owner)
     QByteArray preview = previewOf(*this);
     const bool isStudy = mParent == nullptr;
     const bool isSeries = !isStudy && mParent->mParent == nullptr;
+    // Only a study or a series looks below itself: an image without preview has nothing there.
     if (preview.isEmpty() && (isStudy || (isSeries && !mChildren.isEmpty()))) {
         if (const Volume* volume = largestVolume(isStudy ? mChildren : QList<TagMap*>{this})) {
             preview = volume->previewData();

@@ -12,6 +12,8 @@ namespace Kdd
 namespace
 {
 
+/// Images that stand elsewhere get an empty name, so that nothing here
+/// answers for them and their slices stay unknown.
 void rename(VolumeInfo& info, const QHash<QByteArray, QByteArray>& keys)
 {
     for (std::string& uid : info.imageUIDs)
@@ -31,6 +33,8 @@ CorrectedVolumes::Place CorrectedVolumes::placeOf(const QByteArray& uid, bool is
     bool isOurs = false;
     const auto corrections = mCorrections.ofFormerUID(uid);
     for (const Kxg::ImageCorrection* each : corrections) {
+        // One that is corrected and stands here is the image that the
+        // file means, whatever else bears its old UID.
         const bool isHere = each->shownStudyUID == mCorrections.studyUID();
         if (isHere && mFile.findImage(each->shownImage) != nullptr)
             return {each->shownImage, false, true};
@@ -57,6 +61,7 @@ CorrectedVolumes::Fate CorrectedVolumes::update(VolumeInfo& info, bool isForeign
         keys.insert(uid, place.key);
         isAnyElsewhere = isAnyElsewhere || place.isElsewhere;
         isAnyCorrected = isAnyCorrected || place.isCorrected;
+        // What a correction says to be here may still be missing, when its file could not be read.
         const TagMap* image = mFile.findImage(place.key);
         if (image != nullptr)
             holders.insert(image->parent());
@@ -64,6 +69,7 @@ CorrectedVolumes::Fate CorrectedVolumes::update(VolumeInfo& info, bool isForeign
     // Without corrections the file is right about itself, and what it names may only not have been read.
     if (!isAnyCorrected)
         return Fate::Whole;
+    // From here on the images are those of the tree, under the names that they have there.
     rename(info, keys);
     if (holders.isEmpty() && (isAnyElsewhere || isForeign))
         return Fate::Gone;

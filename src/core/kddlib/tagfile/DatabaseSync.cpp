@@ -42,6 +42,7 @@ public:
 
     ~SeriesQuery()
     {
+        // The question writes into this object, so nobody may leave before its answer.
         if (mThread.joinable())
             mThread.join();
     }
@@ -92,6 +93,7 @@ class DatabaseView
 public:
     DatabaseView(const StudyTree& tree, const Kxg::DicomDirectoryEntry& study)
     {
+        // By the log, since the database may list an image under the UID that it had before it was corrected.
         const QHash<QByteArray, const TagMap*> renamed = correctedImages(tree);
         for (const Kxg::DicomDirectoryEntry& entry : study.entries) {
             mListed.insert(entry.seriesInstanceUID);
@@ -122,8 +124,11 @@ private:
             QString formerUID;
             for (const AuditEntry& entry : qAsConst(entries)) {
                 for (const AuditChange& change : entry.changes) {
+                    // Moved here from another study: that it is not listed here says nothing.
                     if (change.key == DCM_StudyInstanceUID)
                         mKnown.insert(image);
+                    // The first change tells what the DICOM file says;
+                    // later ones replaced what corrections had made.
                     if (change.key == DCM_SOPInstanceUID && formerUID.isEmpty())
                         formerUID = change.oldText;
                 }
@@ -180,12 +185,14 @@ bool removeUnlisted(StudyTree& tree, const DatabaseView& view)
         const QList<TagMap*> images = series->children();
         // Of a listed series whose images were not asked for nothing is known.
         const bool isAsked = !view.lists(it.key()) || view.listsImagesOf(it.key());
+        // From the end, where an image leaves its series at no cost.
         for (int i = images.size() - 1; i >= 0 && isAsked; --i) {
             if (view.knows(images.at(i)))
                 continue;
             tree.dropImage(images.at(i));
             isChanged = true;
         }
+        // A series that is listed stays, even without images: the database says that it is there.
         if (view.lists(it.key()) || !series->children().isEmpty())
             continue;
         tree.dropSeriesAndEmptyStudy(series);
@@ -243,6 +250,7 @@ bool syncWithDatabase(StudyTree& tree, const std::shared_ptr<Kxg::DicomDirectory
                         tree.studyInstanceUID().constData(), study->studyInstanceUID.constData());
         return false;
     }
+    // An entry without series says nothing of them; it must not empty the study.
     if (study->entries.empty()) {
         DatabaseValues(tree).copyStudy(*study);
         return false;
@@ -259,6 +267,7 @@ bool syncWithDatabase(StudyTree& tree, const std::shared_ptr<Kxg::DicomDirectory
         }
     }
     isChanged = removeUnlisted(tree, view) || isChanged;
+    // Series that only the database has are added below, which counts as a change too.
     const int series = tree.series().size();
     DatabaseValues(tree).copyStudy(*study);
     return isChanged || tree.series().size() != series;

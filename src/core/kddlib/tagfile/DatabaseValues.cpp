@@ -46,6 +46,7 @@ TagMap* makeSeries(const Kxg::DicomDirectoryEntry& entry)
         {DCM_SeriesDescription, entry.seriesDescription},
         {DCM_Modality, entry.modality},
         {DCM_SeriesDate, entry.seriesDate},
+        // Times of the database may be written with colons, which DICOM's are not.
         {DCM_SeriesTime, QByteArray(entry.seriesTime).replace(":", "")},
         {DCM_StationName, entry.stationName},
     };
@@ -103,6 +104,7 @@ TagMap* DatabaseValues::makeImage(TagMap* series, const Kxg::ImageFile& file)
     auto* image = new TagMap;
     if (!file.sopInstanceUID.isEmpty())
         image->putAndInsertString(DCM_SOPInstanceUID, file.sopInstanceUID);
+    // Its pixels are in the file alone, as those of nearly every image.
     image->markAsOmitted(DCM_PixelData);
     // Appended and not attached: a first child would replace what the series says by what it has, which is nothing.
     series->appendChild(image);
@@ -120,6 +122,8 @@ void DatabaseValues::addVolumeFilePath(TagMap* series, const Kxg::DicomDirectory
         return;
     Volume* volume = volumeOfFile(*series, entry.name, index);
     if (volume == nullptr && createMissing) {
+        // Volumes that other files should have given are missing. The
+        // index is what counts, so this one keeps it.
         if (index != series->volumes().size())
             LogFile::warnf("Invalid volume index %d (expected %d) for %s", index, series->volumes().size(),
                            entry.name.constData());

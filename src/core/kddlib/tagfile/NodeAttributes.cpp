@@ -36,6 +36,8 @@ void inherit(TagMap& node, const DcmTagKey (&keys)[n])
 {
     for (const DcmTagKey& key : keys) {
         const TagElement* own = node.tagsForLevel().value(key, nullptr);
+        // Attaching marks what a child lacks. These attributes are said
+        // of the node above, and the child shows them.
         if (own != nullptr && own->markedAsMissing())
             node.deleteElement(key);
     }

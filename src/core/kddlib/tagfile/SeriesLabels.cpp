@@ -64,6 +64,7 @@ void createLabels(StudyTree& tree)
     }
     QSet<QByteArray> taken;
     for (auto it = sharing.cbegin(); it != sharing.cend(); ++it)
+        // Labels of a single series count as well: "2 Head (2)" may be what a series is called already.
         taken.insert(it.key());
     QHash<QByteArray, int> counts;
     for (auto it = all.cbegin(); it != all.cend(); ++it) {

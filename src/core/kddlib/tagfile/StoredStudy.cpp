@@ -5,6 +5,8 @@
 #include "kddlib/tagfile/format/StudyWriter.h"
 #include "platform/base/LogFile.h"
 #include "platform/base/Stopwatch.h"
+#include "platform/os/FileStatus.h"
+#include "platform/os/PathName.h"
 
 #include <QCryptographicHash>
 #include <QDataStream>
@@ -29,6 +31,7 @@ void StoredStudy::optimizeAll()
     using Mode = TagFileSettings::CompressionMode;
     QByteArray content;
     if (TagFileSettings::debugOption(TagFileSettings::kMeasureUnoptimised))
+        // Serialized for its size alone, which only those who asked for it pay for.
         mFigures.unoptimisedSize = serialize(Mode::None, content).good() ? content.size() : 0;
     const Stopwatch stopwatch;
     mTree.optimize();
@@ -127,6 +130,7 @@ Result StoredStudy::openToRead(const QString& path, Reader reader)
     // Only who holds the file alone may finish the write, and a shared lock cannot be raised without a gap.
     mFile.close();
     Result result = openToHold(path, reader);
+    // Whoever serves others knows what a file means that stayed held, and tells it in his own words.
     if (result.bad() && (!mIsLockedOut || !isServing))
         LogFile::warnf("Could not open %s: %s", qUtf8Printable(path), qUtf8Printable(result.text()));
     return result;
@@ -179,9 +183,12 @@ Result StoredStudy::finishInterruptedWrite()
 Result StoredStudy::write()
 {
     if (mTree.isEmpty())
+        // Reached when the last image was removed from a file that is held;
+        // without one there is nothing to do away with.
         return mFile.isOpen() ? mFile.remove() : Result::failure(QStringLiteral("No images to write"));
     if (!mFile.isOpen())
         return write(TagFileSettings::cacheFilePathForStudy(mTree.studyInstanceUID().constData()));
+    // Readers go by the file's own lengths, so what a longer study left behind the end may stay.
     Result result = writeInto(mFile, Tail::Keep);
     mFile.close();
     return result;
@@ -232,11 +239,17 @@ Result StoredStudy::writeInto(StudyFile& file, Tail tail)
         result = file.write(content, tail);
     if (result.bad()) {
         LogFile::errorf("Could not write %s: %s", qUtf8Printable(file.path()), qUtf8Printable(result.text()));
+        // An empty file that was made only for this would count as one that is just being made.
         file.removeIfNeverWritten();
         return result;
     }
     // Of the bytes themselves, by which the database later tells whether others wrote since.
     mStamp = {content.size(), QCryptographicHash::hash(content, QCryptographicHash::Md5)};
+    FileStatus written;
+    if (statusOf(pathBytes(file.path()).constData(), written)) {
+        mStamp.fileSize = written.size;
+        mStamp.modified = written.modified;
+    }
     if (LogFile::debugLogging())
         LogFile::printf("Written tag file %s in %d msec", qUtf8Printable(file.path()), mFigures.writeMs);
     return result;

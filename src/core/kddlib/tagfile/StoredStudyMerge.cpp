@@ -35,6 +35,7 @@ Result StoredStudy::merge()
     // Held from before it is read until after it is written: what others merge meanwhile would be lost.
     StudyFile file;
     Result result = openToMerge(file, TagFileSettings::cacheFilePathForStudy(studyUID.constData()));
+    // In an empty file there is nothing to merge with: these images are the study.
     if (result.bad() || file.isEmpty())
         return result.good() ? writeInto(file, Tail::Keep) : result;
     StudyTree fresh;
@@ -44,6 +45,8 @@ Result StoredStudy::merge()
         std::swap(mTree, fresh);
         return result;
     }
+    // From here on the tree is the whole study, also when it cannot be written:
+    // the caller may try again and loses nothing.
     StudyMerge(mTree, fresh).run();
     return writeInto(file, Tail::Keep);
 }

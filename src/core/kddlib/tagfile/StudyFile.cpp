@@ -32,6 +32,8 @@ LockPolling pollingFor(Access access)
 {
     LockPolling polling = access == Access::WriteOrMake ? kWritePolling : kReadPolling;
     if (access == Access::ReadWaiting || access == Access::HoldWaiting)
+        // The site's patience can only prolong: an ordinary reader
+        // never waits longer than one that serves others.
         polling.attempts = qMax(polling.attempts, ExResource::readPatience() / polling.delayMs);
     return polling;
 }
@@ -51,6 +53,7 @@ LockedOpenResult StudyFile::open(const QString& path, Access access)
         return openLockedFile(mFile, path, lockFor(access),
                               makesFile(access) ? IfAbsent::Create : IfAbsent::Fail, pollingFor(access));
     };
+    // Without making the folder first: nearly always it is there.
     LockedOpenResult opened = attempt();
     if (opened || opened.failure == OpenFailure::Locked || !makesFile(access))
         return opened;

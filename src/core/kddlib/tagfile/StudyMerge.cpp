@@ -33,7 +33,9 @@ void StudyMerge::run()
     holdInSeries(study);
     for (auto it = mFresh.series().cbegin(); it != mFresh.series().cend(); ++it)
         mergeSeries(it.value(), it.key(), freshStudy, study);
+    // A series may have lost all its images to fresh ones that stand in another series.
     mTree.deleteEmptyNodes();
+    // Labels are distinct among the series of a study, so fresh ones are made for all.
     if (areLabelled)
         createLabels(mTree);
     // Only what was joined has values to be placed anew; the others are as the file had them.
@@ -54,6 +56,8 @@ void StudyMerge::mergeSeries(TagMap* series, const QByteArray& seriesUID, TagMap
     for (TagMap* image : series->children()) {
         TagMap* former = mTree.forgetImage(StudyTree::imageKey(*image));
         if (former != nullptr && former->parent() == old && series->volumes().isEmpty())
+            // Only where the old volumes stay: a fresh series with volumes of its own has placed its images
+            // already, and an image that comes from another series leaves its volumes behind.
             image->takeVolumePlaces(*former);
         delete former;
     }
@@ -65,11 +69,14 @@ void StudyMerge::mergeSeries(TagMap* series, const QByteArray& seriesUID, TagMap
     for (TagMap* image : series->children())
         mTree.enterImage(StudyTree::imageKey(*image), image);
     if (old != nullptr) {
+        // What the fresh series does not bring is taken over from the old one before that goes.
         copyImages(*old, *series);
         keepVolumeFileMark(*old, *series);
         delete old;
     }
     mTree.enterSeries(seriesUID, series);
+    // The series leaves its study: what it inherits has to be its own
+    // before, and its items have to stand alone.
     series->copyFromParent();
     series->deleteElement(kFromDatabase);
     series->detachItems();

@@ -32,6 +32,7 @@ namespace
 
 // Of more images a user sees nothing in a row of small pictures, and the pictures outweigh all the rest of a tag file.
 constexpr int kLongSeries = 20;
+// Enough to tell the studies of one folder apart; the names stay short.
 constexpr int kHashBytes = 4;
 
 const char* const kNotCreated = "Could not create preview image for DICOM file: %s (%s)";
@@ -76,6 +77,7 @@ bool isLocalizer(const TagMap& image)
         return true;
     if (textOf(image, DCM_Modality) != "MR")
         return false;
+    // Localizers of MR may say so in the description alone.
     const QByteArray description = textOf(image, DCM_SeriesDescription).toUpper();
     return description.contains("LOC") || description.contains("SCOUT");
 }
@@ -97,6 +99,7 @@ ImageKinds kindsIn(const TagMap& series)
 {
     ImageKinds kinds;
     for (const TagMap* image : series.children()) {
+        // An image of a volume is shown by that one's preview.
         if (image->findElement(kVolumeIndex) == nullptr && hasPixelData(*image))
             kindOf(*image, kinds).append(image);
     }
@@ -168,6 +171,7 @@ int exportSeries(TagMap& series, const QString& seriesName)
     return count;
 }
 
+/// Of the hash that gives the study's tag file its place.
 QString studyPrefix(const QByteArray& studyUID)
 {
     const QByteArray hash = QCryptographicHash::hash(studyUID + '\n', QCryptographicHash::Md5);
@@ -211,6 +215,7 @@ bool addPreview(TagMap* image, DcmDataset* dataset, const QString& path)
     if (jpeg.isEmpty())
         return false;
     image->putAndInsertValue(kPreview, VrCode::OB, jpeg);
+    // While the picture is at hand; of anything but a mammogram nothing is stored.
     QuadrantNavigation::process(preview, *image);
     return true;
 }

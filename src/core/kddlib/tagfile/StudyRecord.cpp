@@ -1,6 +1,7 @@
 #include "kddlib/tagfile/StudyRecord.h"
 
 #include "kddlib/items/TextDecoding.h"
+#include "kddlib/tagfile/SearchAttributes.h"
 #include "kddlib/tagfile/SeriesRecord.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
@@ -9,7 +10,6 @@
 #include "platform/os/RandomAccessFile.h"
 
 #include <QCryptographicHash>
-#include <QMultiMap>
 
 #include <dcmtk/dcmdata/dcdeftag.h>
 
@@ -29,6 +29,7 @@ public:
         image.findAndGetString(DCM_SpecificCharacterSet, mCharacterSet);
     }
 
+    /// The database holds texts of all studies, so they are in one encoding there.
     QByteArray operator()(const DcmTagKey& key) const
     {
         QByteArray bytes;
@@ -72,7 +73,7 @@ Kxg::DicomFileRecord fileRecord(const TagMap& image, const QByteArray& path, con
 Kxg::BuiltStudy builtStudy(const QMap<QByteArray, TagMap*>& series, const Kxg::TagFileStamp& stamp)
 {
     // By path, because the order of the tree is that of arrival: two builds of the same files must say the same.
-    QMultiMap<QByteArray, const TagMap*> firstByPath;  // of each series
+    FirstImages firstByPath;
     for (const TagMap* each : series) {
         const TagMap* first = nullptr;
         QByteArray firstPath;
@@ -88,6 +89,7 @@ Kxg::BuiltStudy builtStudy(const QMap<QByteArray, TagMap*>& series, const Kxg::T
     }
     Kxg::BuiltStudy built;
     built.tagFile = stamp;
+    built.search = searchRecord(firstByPath);
     for (auto it = firstByPath.cbegin(); it != firstByPath.cend(); ++it)
         built.series.push_back(fileRecord(*it.value(), it.key(), {}));
     return built;
@@ -101,6 +103,7 @@ bool isTagFile(const QString& path, const Kxg::TagFileStamp& stamp)
     if (stamp.digest.isEmpty() || hasJournal(path) || file.open(pathBytes(path).constData()).bad() ||
         file.size() < stamp.size)
         return false;
+    // Only as many bytes as were written: what lies behind them is left over and says nothing.
     QByteArray content(static_cast<int>(stamp.size), Qt::Uninitialized);
     return file.readAt(0, content.data(), content.size()) == content.size() &&
            QCryptographicHash::hash(content, QCryptographicHash::Md5) == stamp.digest;

@@ -23,6 +23,7 @@ std::vector<QByteArray> textsOf(int count, const char** texts)
 
 }  // namespace
 
+/// Paths are compared with forward slashes, whatever system they were written on.
 QByteArray StudyTree::imageKey(const TagMap& image)
 {
     const QByteArray sopUID = image.uid(TagMap::ImageLevel);
@@ -40,9 +41,11 @@ TagMap* StudyTree::add(TagMap* map, const char* path, bool replace)
     const bool isKnownByPath = key.isEmpty() && path != nullptr;
     if (isKnownByPath)
         key = forwardSlashes(givenPath);
+    // Without any name it could not be found again, and an image of another study has no place here.
     if (key.isEmpty() || (!mStudies.isEmpty() && mStudies.firstKey() != studyUID))
         return nullptr;
     if (TagMap* old = mImages.find(key)) {
+        // Placed once already: to take it out and put it back would lose what it inherits.
         if (old == map)
             return image.release();
         if (!replace)
@@ -68,6 +71,7 @@ void StudyTree::replaceImage(TagMap* old, TagMap& image, const QByteArray& serie
     if (staysInSeries)
         image.takeVolumePlaces(*old);
     delete old;
+    // One that the new image comes into is about to have a child again.
     if (series != nullptr && series->children().isEmpty() && !staysInSeries)
         dropSeries(series);
 }
@@ -102,6 +106,7 @@ TagMap* StudyTree::findImage(const QByteArray& key, const QByteArray& suffix) co
     if (image == nullptr || suffix.isEmpty())
         return image;
     const TagElement* held = image->findElement(kFileSuffix);
+    // An image whose suffix is not known is not refused: there is no other of its UID.
     return held == nullptr || held->value() == suffix ? image : nullptr;
 }
 
@@ -167,6 +172,7 @@ void StudyTree::dropSeriesAndEmptyStudy(TagMap* series)
 {
     for (TagMap* image : series->children())
         mImages.remove(image, imageKey(*image));
+    // Asked before the series goes and takes the answer along.
     TagMap* study = series->parent();
     dropSeries(series);
     if (study != nullptr)

@@ -28,6 +28,7 @@ void StudyVolumes::add(const StudyTree& tree, const std::vector<VolumeInfo*>& in
     QSet<TagMap*> touched;
     int index = -1;
     for (const VolumeInfo* info : infos) {
+        // Counted on for volumes that are left out too: the index is the place of the file in the list.
         ++index;
         const QVector<TagMap*> images = imagesOf(tree, *info, index);
         if (images.isEmpty())
@@ -50,11 +51,13 @@ QVector<TagMap*> StudyVolumes::imagesOf(const StudyTree& tree, const VolumeInfo&
     images.reserve(static_cast<int>(info.imageUIDs.size()));
     for (const std::string& uid : info.imageUIDs) {
         TagMap* image = tree.findImage(QByteArray::fromStdString(uid));
+        // The file may be older than the study is now, or its image could not be read.
         if (image == nullptr || image->parent() == nullptr) {
             LogFile::tracef(2, kCategory, "3D volume %s contains unknown image %s", info.name.constData(),
                             uid.c_str());
             continue;
         }
+        // A volume belongs to one series, and a reader looks for its images there only.
         if (!images.isEmpty() && image->parent() != images.first()->parent()) {
             LogFile::warnf("3D volume %s contains image %s of another series, %s", info.name.constData(),
                            uid.c_str(), image->uid(TagMap::SeriesLevel).constData());

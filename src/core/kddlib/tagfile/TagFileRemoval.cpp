@@ -29,6 +29,7 @@ SystemResult removeTagFileOnce(const QString& path)
     const LockedOpenResult opened = openLockedFile(file, path, FileLock::Exclusive, IfAbsent::Fail, kOnce);
     if (opened)
         return removeWithJournal(file, path);
+    // What is not there need not be removed.
     return opened.failure == OpenFailure::NotFound ? SystemResult() : opened.result();
 }
 

@@ -50,6 +50,7 @@ void TagFileSettings::setMetaFolder(const char* path)
 
 QString TagFileSettings::cacheFilePathForStudy(const char* studyUID)
 {
+    // Two levels of folders keep each of them small, and a hash fills them evenly: UIDs begin alike.
     const QByteArray hash =
         QCryptographicHash::hash(QByteArray(studyUID) + '\n', QCryptographicHash::Md5).toHex();
     return pathText(metaFolder()) +

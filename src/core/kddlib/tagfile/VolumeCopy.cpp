@@ -40,6 +40,7 @@ Volume* Volume::duplicate(TagFile& tagFile, TagMap& series) const
     series.addBareVolume(copy);
     copy->mSlices = slices();
     copy->setGeometry(mDims, mBoundingBox, mTransformation);
+    // As they are, even when nothing was computed yet: to ask for them would compute them for the source too.
     copy->mRescaleSlope = mRescaleSlope;
     copy->mRescaleIntercept = mRescaleIntercept;
     copy->setPadding(mPaddingValue, mPaddingRangeLimit);

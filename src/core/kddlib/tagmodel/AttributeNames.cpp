@@ -53,6 +53,7 @@ bool findByName(const DcmDataDictionary& dictionary, const QByteArray& name, Res
     return true;
 }
 
+/// The pattern ends in \z and not in $, which would also match before a line feed at the end of the name.
 bool isNumbers(const QString& name, DcmTagKey& key)
 {
     static const QRegularExpression pattern(QStringLiteral("^\\(([0-9A-Fa-f]{4}),([0-9A-Fa-f]{4})\\)\\z"));
@@ -70,10 +71,13 @@ Resolution resolve(const QString& name)
     Resolution resolution;
     DcmTagKey key;
     if (isNumbers(name, key)) {
+        // Without a creator no private entry answers, so the numbers of a private value name nothing.
         if (dictionary->findEntry(key, nullptr) != nullptr)
             resolution = {true, key};
         return resolution;
     }
+    // DCMTK's keyword of an attribute that DICOM has given up begins with RETIRED_; callers name it without.
+    // Former keywords come last, because a name that the dictionary still knows means just that.
     const QByteArray text = name.toUtf8();
     if (findByName(*dictionary, text, resolution) || findByName(*dictionary, "RETIRED_" + text, resolution))
         return resolution;
@@ -95,6 +99,8 @@ bool resolveAttributeName(const QString& name, DcmTagKey& key)
         // All at once: who asks for thousands of names asks for names that do not exist, and the few others come back.
         if (remembered.size() >= kMaxRemembered)
             remembered.clear();
+        // Failures are remembered as well: to find nothing the
+        // dictionary is walked to its end, several times.
         known = remembered.insert(name, resolve(name));
     }
     if (known->found)

@@ -14,6 +14,8 @@ struct Row
     const char* current;
 };
 
+// Paths and queries that programs have stored outlive the dictionary they were written with. Since then DICOM
+// has dropped the possessive forms and unified how units, dates and compound words are spelt.
 constexpr Row kRows[] = {
     {"ReferringPhysiciansName", "ReferringPhysicianName"},
     {"ReferringPhysiciansAddress", "ReferringPhysicianAddress"},

@@ -42,6 +42,7 @@ bool isNumberText(VrCode vr)
     return vr == VrCode::AS || vr == VrCode::DA || vr == VrCode::DS || vr == VrCode::IS;
 }
 
+/// Index 0 stands for the whole text, which is not split for it: several values are no number then.
 int textAsInt(const QByteArray& text, int index, bool& ok)
 {
     if (index == 0)
@@ -51,6 +52,8 @@ int textAsInt(const QByteArray& text, int index, bool& ok)
     return ok ? parts.at(index).toInt(&ok, 10) : 0;
 }
 
+/// The value of an int: an unsigned number of 32 bits from 2^31 on comes out negative, with the same bits. A
+/// caller that needs it whole looks at the VR.
 int numberAt(const char* at, VrCode vr)
 {
     switch (vr) {
@@ -66,6 +69,7 @@ int numberAt(const char* at, VrCode vr)
     }
 }
 
+/// Floats are none, whatever their value, and neither are words of which nobody told the sign.
 bool holdsIntegers(VrCode vr)
 {
     return vr == VrCode::OB || vr == VrCode::OW || vr == VrCode::US || vr == VrCode::SS || vr == VrCode::SL ||
@@ -82,18 +86,22 @@ QTime timeOf(const QByteArray& text)
     return {text.mid(0, 2).toInt(), text.mid(2, 2).toInt(), text.mid(4, 2).toInt()};
 }
 
+/// Eight digits only. The form with dots that the oldest files have counts as malformed.
 QVariant asDate(const QByteArray& text)
 {
     const QByteArray trimmed = text.trimmed();
     return trimmed.size() == 8 ? QVariant(dateOf(trimmed)) : QVariant();
 }
 
+/// The fraction of a second is left out. DICOM lets minutes and seconds be missing; such a time
+/// is not completed and counts as malformed.
 QVariant asTime(const QByteArray& text)
 {
     const QByteArray trimmed = text.trimmed().left(6);
     return trimmed.size() == 6 ? QVariant(timeOf(trimmed)) : QVariant();
 }
 
+/// Fraction and time zone are left out, as the result is a local time in whole seconds.
 QVariant asDateTime(const QByteArray& text)
 {
     const QByteArray trimmed = text.trimmed().left(14);

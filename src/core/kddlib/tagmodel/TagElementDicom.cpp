@@ -10,6 +10,7 @@ namespace Kdd
 namespace
 {
 
+// The base tag of a repeating group: DCMTK folds 6002, 6004 and so on into it.
 const DcmTagKey kOverlayData(0x6000, 0x3000);
 
 template <typename T>
@@ -18,6 +19,7 @@ const T* arrayOf(const QByteArray& bytes)
     return reinterpret_cast<const T*>(bytes.constData());
 }
 
+/// An incomplete number at the end is not counted.
 template <typename T>
 unsigned long countOf(const QByteArray& bytes)
 {
@@ -106,10 +108,12 @@ std::unique_ptr<DcmElement> youngerElement(VrCode vr, const DcmTag& tag, const Q
 
 std::unique_ptr<DcmElement> bytesElement(VrCode vr, const DcmTag& tag, const QByteArray& bytes)
 {
+    // These two have classes of their own, which take words as bytes too, whatever VR the tag has.
     if (tag == DCM_PixelData)
         return pixelElement<DcmPixelData>(tag, bytes);
     if (tag.getBaseTag() == kOverlayData)
         return pixelElement<DcmOverlayData>(tag, bytes);
+    // A value stored as UN may be of a younger VR, which only the tag tells.
     if (auto younger = youngerElement(vr, tag, bytes))
         return younger;
     return otherElement(tag, bytes);
@@ -187,6 +191,7 @@ std::unique_ptr<DcmElement> TagElement::newDcmElement(const DcmTag& tag) const
     case VrCode::Up:
         return arrayElement<DcmUnsignedLong, Uint32, &DcmUnsignedLong::putUint32Array>(tag, mValue);
     case VrCode::US:
+    // Nobody told whether these words are signed; as words they are the same.
     case VrCode::Xs:
         return arrayElement<DcmUnsignedShort, Uint16, &DcmUnsignedShort::putUint16Array>(tag, mValue);
     case VrCode::UT:

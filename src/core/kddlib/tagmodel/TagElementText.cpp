@@ -16,6 +16,7 @@ namespace Kdd
 namespace
 {
 
+// Each of them fills, backslashes included, the 64 characters that a dump shows of a value.
 constexpr int kWordsShown = 13;
 constexpr int kBytesShown = 22;
 
@@ -32,6 +33,7 @@ void appendHex(QByteArray& out, quint16 word)
     appendHex(out, static_cast<quint8>(word & 0xff));
 }
 
+/// QByteArray writes numbers without the process's locale, so a text is the same on every machine.
 QByteArray decimal(double value)
 {
     return QByteArray::number(value, 'g', 6);
@@ -86,6 +88,7 @@ void appendTags(QByteArray& out, const QByteArray& bytes)
     }
 }
 
+/// In the byte order that elements keep, whatever the machine's.
 template <typename T>
 void appendBytes(QByteArray& bytes, T value)
 {
@@ -93,6 +96,7 @@ void appendBytes(QByteArray& bytes, T value)
     bytes.append(reinterpret_cast<const char*>(&little), static_cast<int>(sizeof little));
 }
 
+/// White space separates words as a backslash does; a word that is no number becomes 0.
 template <typename Convert>
 QByteArray numbersFromWords(const QByteArray& text, Convert convert)
 {
@@ -139,6 +143,7 @@ void TagElement::getValueAsString(QByteArray& out, VrCode vr) const
     case VrCode::OW:
         appendHexNumbers<quint16>(out, mValue, kWordsShown);
         break;
+    // Bytes, look-up tables and whatever has no VR that is known.
     default:
         appendHexNumbers<quint8>(out, mValue, kBytesShown);
         break;
@@ -149,6 +154,7 @@ bool TagElement::getValueAsString(QByteArray& out, const DcmTagKey& key, const c
 {
     VrCode vr = mVr;
     if (vr == VrCode::UN) {
+        // Only while the dictionary is held is the entry sure to be there.
         const DcmDictEntry* entry = dcmDataDict.rdlock().findEntry(key, privateCreator);
         if (entry != nullptr)
             vr = vrCodeOf(entry->getEVR());
@@ -181,6 +187,7 @@ void TagElement::getValueAsStringFromOBOW(QByteArray& out, int type) const
     }
 }
 
+/// Numbers that the VR cannot hold are not refused here but cut; who corrects values checks them before.
 bool TagElement::putValueAsString(const QByteArray& text)
 {
     if (isTextVr(mVr)) {

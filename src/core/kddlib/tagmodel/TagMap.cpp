@@ -14,6 +14,8 @@ namespace Kdd
 namespace
 {
 
+// A private creator reserves one of these blocks of its group by writing its name to (gggg,00bb); its
+// values are then (gggg,bb00) to (gggg,bbff).
 constexpr quint16 kFirstBlock = 0x10;
 constexpr quint16 kLastBlock = 0xff;
 
@@ -27,6 +29,7 @@ DcmTagKey creatorKey(const DcmTagKey& key, quint16 block)
     return {key.getGroup(), block};
 }
 
+/// A private attribute is known by its low byte. Which block it stands in is chosen anew by every writer.
 DcmTagKey inBlock(const DcmTagKey& key, quint16 block)
 {
     return {key.getGroup(), static_cast<Uint16>((block << 8) | (key.getElement() & 0xff))};
@@ -47,6 +50,8 @@ struct CreatorSearch
     quint16 free = kFirstBlock;
 };
 
+/// Looks at the merged view, because a creator may stand at the series while its values stand at the images.
+/// Keys ascend, so the first number that is skipped is the first free block.
 CreatorSearch findCreator(const TagMap& map, const DcmTagKey& key, const char* creator)
 {
     CreatorSearch search;
@@ -135,6 +140,8 @@ bool TagMap::findAndGetString(const DcmTagKey& key, const char* creator, QByteAr
 
 TagElement* TagMap::putElement(const DcmTagKey& key, TagElement* element)
 {
+    // The former element goes last, when the key points at the new one already, for the new one may have been
+    // made from it. What is put where it stands must not go at all.
     TagElement*& place = mTags[key];
     const std::unique_ptr<TagElement> replaced(place != element ? place : nullptr);
     place = element;
@@ -183,6 +190,7 @@ bool TagMap::putAndInsertString(const DcmTagKey& key, const QByteArray& text)
     return putAndInsertString(key, nullptr, text);
 }
 
+/// The creator only finds the VR. The key is taken as it stands, block included.
 bool TagMap::putAndInsertString(const DcmTagKey& key, const char* creator, const QByteArray& text)
 {
     TagElement* element = ownElement(key);
@@ -216,6 +224,7 @@ bool TagMap::putAndInsertValue(const DcmTagKey& key, const char* creator, VrCode
     const CreatorSearch search = findCreator(*this, key, creator);
     if (search.found != 0)
         return putAndInsertValue(inBlock(key, search.found), vr, bytes);
+    // Everything is checked before the creator is written: a refusal must not leave a block reserved.
     const DcmTagKey target = inBlock(key, search.free);
     if (search.free > kLastBlock || holdsSequence(target) || holdsSequence(creatorKey(key, search.free)))
         return false;
@@ -224,12 +233,14 @@ bool TagMap::putAndInsertValue(const DcmTagKey& key, const char* creator, VrCode
     return putAndInsertValue(target, vr, given);
 }
 
+/// A sequence whose VR was made a marker shows nothing, so replacing it loses nothing.
 bool TagMap::holdsSequence(const DcmTagKey& key) const
 {
     const TagElement* own = ownElement(key);
     return own != nullptr && own->isSequence() && !own->markedAsMissing() && !own->markedAsOmitted();
 }
 
+/// Callers set bytes and VR, so a plain element serves again whatever it was, a marker included.
 TagElement* TagMap::plainElement(const DcmTagKey& key)
 {
     TagElement* element = ownElement(key);

@@ -42,6 +42,8 @@ void append(std::string* diffs, const std::string& line)
 
 }  // namespace
 
+/// Both views are in key order and are walked side by side, so a key that
+/// only one of them has is met there at once.
 bool TagMap::compare(const TagMap& other, bool strict, std::string* diffs) const
 {
     const iterator last = end();
@@ -63,6 +65,7 @@ bool TagMap::compare(const TagMap& other, bool strict, std::string* diffs) const
             append(diffs, text(mine) + " <> " + text(theirs) + "\n");
             return false;
         }
+        // Only the value of a private attribute is passed over. That one side lacks it has been found above.
         const bool isPassedOver = !strict && (mine.key().getGroup() & 1) != 0;
         if (!isPassedOver && !mine.value()->compare(*theirs.value(), strict, diffs)) {
             if (diffs != nullptr)

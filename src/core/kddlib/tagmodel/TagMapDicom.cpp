@@ -19,6 +19,8 @@ namespace Kdd
 namespace
 {
 
+/// Curve Data (50xx,3000) and Overlay Data (60xx,3000) have sixteen
+/// groups each, from `first` on in steps of two.
 bool isRepeatingGroup(const DcmTagKey& key, Uint16 first)
 {
     return key.getGroup() >= first && key.getGroup() <= first + 0x1e && key.getElement() == 0x3000;
@@ -42,6 +44,7 @@ bool hasLargeBound(const DcmTagKey& key)
     case 0x0070:
         return key == DCM_GraphicData;
     case 0x0071:
+        // 21 is our audit log, which the next correction continues.
         return low == 0x21 || low == 0x62 || low == 0x64;
     default:
         return isRepeatingGroup(key, 0x5000) || isRepeatingGroup(key, 0x6000);
@@ -114,6 +117,7 @@ TagMap* TagMap::createTagMap(DcmItem* item, unsigned int maxLength, int depth)
         map->addObject(*object, maxLength, depth);
     if (item->ident() == EVR_dataset) {
         const E_TransferSyntax xfer = static_cast<DcmDataset*>(item)->getOriginalXfer();
+        // A dataset built in memory has none. As one byte its -1 would pass for an encapsulated syntax.
         if (xfer != EXS_Unknown)
             map->putAndInsertValue(kTransferSyntax, VrCode::OB, QByteArray(1, static_cast<char>(xfer)));
     }
@@ -123,6 +127,8 @@ TagMap* TagMap::createTagMap(DcmItem* item, unsigned int maxLength, int depth)
 void TagMap::addObject(DcmObject& object, unsigned int maxLength, int depth)
 {
     const DcmTagKey key(object.getGTag(), object.getETag());
+    // Group 0 belongs to messages, not to objects. Element 0 is the group's length, which is wrong as
+    // soon as one value of the group is left out.
     if (key.getGroup() == 0 || key.getElement() == 0 || isOwnAttribute(key))
         return;
     if (object.ident() == EVR_SQ)
@@ -140,8 +146,11 @@ void TagMap::addSequence(DcmSequenceOfItems& sequence, unsigned int maxLength, i
                        unsigned(key.getGroup()), unsigned(key.getElement()), kMaxItemDepth);
         markAsOmitted(key);
     } else if (isPrivate && sequence.getLength(EXS_LittleEndianImplicit, EET_UndefinedLength) > maxLength) {
+        // A private sequence is measured as a whole; of a public one only
+        // the values that are too long are left out.
         markAsOmitted(key);
     } else {
+        // The table is a value of an item, so the larger bound has to go down into the items.
         setSequence(&sequence, isLookupTableSequence(key) ? kLargeValueBound : maxLength, depth);
     }
 }
@@ -170,6 +179,8 @@ TagElement* TagMap::setElement(DcmElement* element)
     auto copy = std::make_unique<TagElement>(VrCode::UN, held != nullptr ? held->value() : QByteArray());
     // NOLINTNEXTLINE(clang-analyzer-unix.Malloc): a condition frees the text it owns
     const OFCondition condition = copyValue(*element, *copy);
+    // A sequence is an object of another class and can only be
+    // replaced, which an unreadable value must not do.
     if (held == nullptr || (held->isSequence() && condition.good()))
         return putElement(key, copy.release());
     if (!held->isSequence()) {
@@ -210,6 +221,7 @@ void TagMap::insertInto(DcmItem& item) const
         if (it.value()->markedAsOmitted())
             continue;
         std::unique_ptr<DcmElement> element(it.value()->createDcmElement(it.key()));
+        // The item owns the element from the moment it has taken it; what it refuses goes with the pointer.
         if (element != nullptr && item.insert(element.get()).good())
             static_cast<void>(element.release());
     }

@@ -49,6 +49,7 @@ bool TagMap::iterator::operator==(const iterator& other) const
     return mLevels[mCurrent].at == other.mLevels[other.mCurrent].at;
 }
 
+/// Three levels cover a study's tree: image, series and study, or the items that hang below each other there.
 TagMap::iterator TagMap::begin() const
 {
     iterator it;

@@ -18,6 +18,7 @@ namespace
 constexpr qint64 kElementCost = 7;
 constexpr qint64 kMissingCost = 5;
 
+// Each modification of an object adds an item, so the sequence has no bound of its own.
 constexpr int kOriginalAttributesKept = 4;
 
 qint64 costOf(const TagElement& element)
@@ -75,6 +76,7 @@ public:
         if (shown == nullptr)
             return;
         mCurrent += costOf(*shown);
+        // An inherited value that is a sequence makes the key one, even if no child holds it.
         mIsSequence = mIsSequence || shown->vr() == VrCode::SQ;
         if (inheriting > 0)
             mCosts[shown] += inheriting * costOf(*shown);
@@ -182,6 +184,8 @@ void TagMap::optimizeAll()
     if (mChildren.isEmpty())
         return;
     std::unordered_map<quint32, Elements> heldByKey;
+    // Keys that no child holds are looked at too: a marker here at
+    // the root, for example, has nothing to hide.
     for (auto it = mTags.cbegin(); it != mTags.cend(); ++it)
         heldByKey[packed(it.key())];
     for (const TagMap* child : qAsConst(mChildren)) {
@@ -198,6 +202,7 @@ void TagMap::place(const DcmTagKey& key, const Elements& held)
     if (mChildren.isEmpty())
         return;
     const Survey survey(held, findElement(key), mChildren.size());
+    // Sequences have items and no bytes, so their cost is not known; attaching has placed them.
     if (survey.isSequence())
         return;
     if (survey.seesNothing()) {
@@ -207,9 +212,11 @@ void TagMap::place(const DcmTagKey& key, const Elements& held)
     const TagElement& best = survey.best();
     const qint64 costHere = survey.costWith(best);
     const qint64 costBelow = survey.costBelow();
+    // Only for a gain: at equal cost everything stays, so that a second pass finds nothing to move.
     if (costBelow < costHere && costBelow < survey.currentCost())
         storeOptionA(key);
     else if (costHere < survey.currentCost())
+        // The bytes are held on to, because the child that `best` belongs to loses it on the way.
         storeHere(key, best.vr(), QByteArray(best.value()), Match::BytesAndVr);
 }
 
@@ -236,6 +243,8 @@ void TagMap::storeOptionA(const DcmTagKey& keyGiven)
         else if (own == nullptr && shown != nullptr)
             child->putElement(key, shown->clone());
     }
+    // What a node further up shows would come through once the own
+    // value is gone, so there it has to be hidden.
     if (mParent == nullptr || mParent->findElement(key) == nullptr) {
         deleteElement(key);
         return;
@@ -280,6 +289,7 @@ void TagMap::storeHere(const DcmTagKey& key, VrCode vr, QByteArray value, Match 
             child->putElement(key, shown->clone());
         }
     }
+    // Last, because what the children were given copies of may be this node's own element.
     TagElement* here = plainElement(key);
     here->value() = std::move(value);
     here->setVr(vr);

@@ -24,6 +24,7 @@ const TagMap* itemOf(const TagMap& node, const QString& part)
     if (element == nullptr || !element->isSequence())
         return nullptr;
     const auto* sequence = static_cast<const TagSequence*>(element);
+    // The number ends at the closing bracket, which is not insisted on; without any digits it is item 0.
     const long index = std::strtol(part.mid(bracket + 1).toLatin1().constData(), nullptr, 10);
     return index >= 0 && index < sequence->numItems() ? sequence->item(static_cast<int>(index)) : nullptr;
 }

@@ -71,6 +71,8 @@ private:
         mOut << kSequenceColumns << name << '\n';
         for (int i = 0; i < sequence.numItems(); ++i) {
             mOut << blanks(2) << "(fffe,e000)\n";
+            // Items are shown in the way of what holds them: a dump
+            // goes on merged, a listing with own entries.
             if (&mLayout == &kDump)
                 sequence.itemToRead(i).dump(mOut, mIndent + 4);
             else
@@ -83,6 +85,7 @@ private:
     void plain(const DcmTagKey& key, const TagElement& element, const QByteArray& name)
     {
         QByteArray text;
+        // Private values of files without explicit VRs are UN; the dictionary may know them by their creator.
         if (element.vr() == VrCode::UN && (key.getGroup() & 1) != 0)
             element.getValueAsString(text, key, mMap.privateCreator(key));
         else
@@ -102,6 +105,7 @@ private:
         mOut << ' ' << name << '\n';
     }
 
+    /// As a dump tells it: bytes are one value however many they are.
     static int multiplicity(const TagElement& element, bool isText)
     {
         if (element.value().isEmpty())

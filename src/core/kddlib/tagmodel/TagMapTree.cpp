@@ -37,6 +37,8 @@ TagSequence* asSequence(TagElement* element)
 
 }  // namespace
 
+/// The copy counts as taken out: it inherits from the parent, but the
+/// parent's list names the source, not the copy.
 TagMap::TagMap(const TagMap& other)
     : mParent(other.mParent)
     , mChildren(other.mChildren)
@@ -81,12 +83,14 @@ void TagMap::releaseAll()
 {
     clearVolumes();
     leaveVolumes();
+    // A list of its own: an item that stands alone takes itself out of the other while it is walked.
     const QList<TagMap*> children = mChildren;
     for (TagMap* child : children) {
         if (mIsSequenceItem) {
             // Items below an item belong to sequences of their own, which still show them.
             child->standAlone();
         } else {
+            // Unhooked, so that it need not look itself up in a list that goes as well.
             child->mParent = nullptr;
             delete child;
         }
@@ -117,6 +121,7 @@ bool TagMap::removeChildMap(TagMap* child)
     else if (!mChildren.removeOne(child))
         return false;
     child->mIsTakenOut = true;
+    // Volumes belong to this node, and name no image that is not one of its own.
     child->leaveVolumes();
     return true;
 }
@@ -148,6 +153,7 @@ QByteArray TagMap::uid(Level level) const
     if (element == nullptr)
         return {};
     QByteArray text = element->value();
+    // Padding is dropped when a value is read as a text; one of VR UN still has it.
     while (text.endsWith('\0') || text.endsWith(' '))
         text.chop(1);
     return text;
@@ -162,6 +168,8 @@ void TagMap::addChildMap(TagMap* child, Level level)
     }
     // The UID is taken out first: the node above has one of another image, or must not receive this one's.
     TagElement* uid = child->removeUID(level);
+    // The first image of a series brings all that the series is to say, in place of what stood there. An item
+    // has values of its own, which its sequence shows.
     if (mChildren.isEmpty() && !mIsSequenceItem)
         adoptFrom(child);
     else
@@ -225,6 +233,7 @@ void TagMap::attachItems(const TagSequence& parentSequence, const TagSequence& c
     for (int i = 0; i < qMin(parentSequence.numItems(), childSequence.numItems()); ++i) {
         TagMap* above = parentSequence.item(i);
         TagMap* item = childSequence.item(i);
+        // An item that is not there gives nothing and takes nothing.
         if (above == nullptr || item == nullptr)
             continue;
         item->standAlone();
@@ -275,6 +284,7 @@ void TagMap::standAlone()
     const iterator last = end();
     for (iterator it = begin(); it != last; ++it) {
         const bool isOwn = ownElement(it.key()) == it.value();
+        // The view comes in key order, so the end is always the right place.
         all.insert(all.cend(), it.key(), isOwn ? it.value() : it.value()->clone());
     }
     // The view shows no markers, so they are in nobody's hands; without a parent they have nothing to hide.
@@ -299,6 +309,7 @@ void TagMap::relinkOwnItems()
         const TagSequence* sequence = asSequence(it.value());
         if (sequence == nullptr)
             continue;
+        // What the parent shows and not what it holds: the sequence may stand one node further up.
         const TagSequence* above = mParent != nullptr ? asSequence(mParent->findElement(it.key())) : nullptr;
         for (int i = 0; i < sequence->numItems(); ++i) {
             TagMap* item = sequence->item(i);
@@ -313,6 +324,7 @@ void TagMap::relinkOwnItems()
 
 void TagMap::hangBelow(TagMap* item)
 {
+    // Where it hangs already, standing alone first would copy all it inherits only to drop it again.
     if (mParent == item && !mIsTakenOut)
         return;
     standAlone();

@@ -23,6 +23,7 @@ void TagMap::leaveVolumes()
     mVolumePlaces.clear();
 }
 
+/// The lists keep their places; only the image that stands in each is another one.
 void TagMap::takeVolumePlaces(TagMap& former)
 {
     for (const VolumePlace& each : qAsConst(former.mVolumePlaces)) {

@@ -48,6 +48,7 @@ const TagMap& TagSequence::itemToRead(int i) const
 
 void TagSequence::truncate(int count)
 {
+    // The shared items at the head are another sequence's to delete.
     const QList<TagMap*> gone = mItems.mid(qMax(count, mShared));
     mItems = mItems.mid(0, count);
     mShared = qMin(mShared, mItems.size());
@@ -70,6 +71,7 @@ bool TagSequence::compare(const TagElement& other, bool checkVR, std::string* di
     for (int i = 0; i < numItems(); ++i) {
         const TagMap* mine = item(i);
         const TagMap* theirs = otherSequence.item(i);
+        // An item that is not there equals nothing: it cannot be known to be the same.
         if (mine == nullptr || theirs == nullptr || !mine->compare(*theirs, checkVR, diffs))
             return false;
     }
@@ -81,6 +83,7 @@ DcmElement* TagSequence::createDcmElement(const DcmTagKey& key) const
     auto sequence = std::make_unique<DcmSequenceOfItems>(tagFor(key));
     for (int i = 0; i < numItems(); ++i) {
         auto item = std::make_unique<DcmItem>();
+        // One that is not there becomes an empty item, so that those after it keep their numbers.
         itemToRead(i).insertInto(*item);
         sequence->append(item.release());
     }

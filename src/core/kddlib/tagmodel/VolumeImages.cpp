@@ -44,6 +44,7 @@ QVector<int> VolumeImages::closeGaps()
     QVector<TagMap*> kept;
     kept.reserve(mImages.size());
     for (int i = 0; i < places.size(); ++i) {
+        // Its place stays -1, which a slice takes for an unknown image.
         if (mImages.at(i) == nullptr)
             continue;
         places[i] = kept.size();
@@ -55,16 +56,19 @@ QVector<int> VolumeImages::closeGaps()
 
 void VolumeImages::forget(int place)
 {
+    // The place stays, for slices count by it; gaps are closed together, when the images are next asked for.
     mImages[place] = nullptr;
     mHasGaps = true;
 }
 
+/// Takes this list out of its images, which may live on without it.
 void VolumeImages::release()
 {
     for (TagMap* image : qAsConst(mImages)) {
         if (image == nullptr)
             continue;
         QVector<TagMap::VolumePlace>& places = image->mVolumePlaces;
+        // An image may be in this list more than once and in those of other volumes, which stay.
         places.erase(std::remove_if(places.begin(), places.end(),
                                     [this](const TagMap::VolumePlace& each) { return each.images == this; }),
                      places.end());

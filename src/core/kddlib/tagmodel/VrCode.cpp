@@ -23,12 +23,15 @@ static_assert(std::size(kEvrByCode) == 44, "one entry for each code");
 static_assert(EVR_OB == 12 && EVR_UNKNOWN2B == 51,
               "DCMTK's numbering has changed: look for VRs without a code");
 
+// More than DCMTK has, and what its enumeration can hold: a release
+// with a few more VRs stays inside the table.
 constexpr std::size_t kEvrNumbers = 64;
 
 /// Codes by DCMTK's number. What has no code of its own keeps its bytes under another one.
 std::array<VrCode, kEvrNumbers> codesByEvr()
 {
     std::array<VrCode, kEvrNumbers> table{};
+    // A VR that has no code yet keeps its bytes as UN.
     table.fill(VrCode::UN);
     for (std::size_t code = 0; code < std::size(kEvrByCode); ++code)
         table[kEvrByCode[code]] = static_cast<VrCode>(code);

@@ -12,6 +12,7 @@ namespace Kdd
 namespace
 {
 
+/// Null also for a sequence of which only the marker is kept: its items are not known here.
 const TagSequence* sequenceOf(const TagMap& node, const DcmTagKey& key)
 {
     const TagElement* element = node.findElement(key);

@@ -26,6 +26,8 @@ struct Limits
     float maximum;
 };
 
+/// From centre to centre: the first reduced voxel has its centre in the middle of its block, which lies
+/// (factor - 1) / 2 voxels behind the centre of the first one.
 Limits reduced(int dims, int lowResDims, int factor, const Limits& limits)
 {
     const float voxel = dims >= 2 ? (limits.maximum - limits.minimum) / static_cast<float>(dims - 1) : 0;

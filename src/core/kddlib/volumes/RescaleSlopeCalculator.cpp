@@ -25,6 +25,8 @@ float asFloat(quint32 wrapped)
 
 }  // namespace
 
+/// Goes by the values that the bits allow, not by those that the pixels have: nothing has to be decoded for
+/// it. Moving signed values up moves the intercept too, so that signed and unsigned images can be compared.
 void RescaleSlopeCalculator::add(float slope, float intercept, int bitsStored, bool isSigned)
 {
     float rawMin = 0;
@@ -45,6 +47,7 @@ void RescaleSlopeCalculator::add(float slope, float intercept, int bitsStored, b
 
 void RescaleSlopeCalculator::compareWithFirst(float slope, float intercept, int bitsStored)
 {
+    // A slope of 0 says nothing about how fine the values are.
     if (mHasFirst) {
         mAllEqual = mAllEqual && slope == mFirstSlope && intercept == mFirstIntercept;
         if (slope != 0)
@@ -89,6 +92,7 @@ float RescaleSlopeCalculator::rescaleIntercept() const
     return mAllEqual ? mFirstIntercept : mPhysMin;
 }
 
+/// How many times finer the finest image steps than the buffer does, as a power of two.
 float RescaleSlopeCalculator::precisionBitLoss() const
 {
     if (mAllEqual || mMinAbsSlope >= std::fabs(step()))

@@ -9,6 +9,7 @@ namespace Kdd
 namespace
 {
 
+/// Owns the volumes of a series; the copy of a node only shares them, as it shares elements and children.
 class SeriesVolumes : public VolumeHolder
 {
 public:

@@ -64,6 +64,7 @@ Result checkPixels(const FrameTags& at)
     const QByteArray photometric = at.text(DCM_PhotometricInterpretation);
     const int samples = integerOf(image, DCM_SamplesPerPixel, 1);
     const int bits = integerOf(image, DCM_BitsStored, 0);
+    // Mostly only the marker of pixels that are too long is kept, which is enough to know of them.
     if (image.findElement(DCM_PixelData) == nullptr)
         return refuse("Pixel Data", QByteArray());
     if (photometric != "MONOCHROME1" && photometric != "MONOCHROME2")
@@ -131,6 +132,7 @@ void readPadding(StackFrame& frame)
         return;
     value = asStored(value, frame.isSigned);
     limit = frame.hasPaddingRange ? asStored(limit, frame.isSigned) : value;
+    // The limit may lie below the value as well as above it.
     frame.paddingMin = qMin(value, limit);
     frame.paddingMax = qMax(value, limit);
 }
@@ -161,6 +163,7 @@ Result readOrientation(StackFrame& frame)
     const QVector<double> c = numbersOf(text);
     if (c.size() != 6)
         return refuse("Image Orientation (Patient)", text);
+    // The row's direction is only brought to length 1. The column's loses what it has of the row's.
     const Vec3d row{c[0], c[1], c[2]};
     const Vec3d column{c[3], c[4], c[5]};
     if (!isUnit(row) || !isUnit(column) || std::fabs(dot(row, column)) > kDirectionTolerance)
@@ -182,6 +185,7 @@ Result readSpacing(StackFrame& frame)
         if (value < 1 / kMaxSpacing || value > kMaxSpacing)
             return refuse("Pixel Spacing", text);
     }
+    // DICOM names the distance between rows first, which runs along the columns.
     frame.rowSpacing = spacing[0];
     frame.columnSpacing = spacing[1];
     return {};
@@ -209,6 +213,7 @@ Result readRescale(StackFrame& frame)
     return readNumber(intercept, frame.intercept) ? Result() : refuse("Rescale Intercept", intercept);
 }
 
+/// What a frame has of its own. Of several things that are missing the first is told.
 Result readFrame(StackFrame& frame)
 {
     for (const auto read : {readPosition, readOrientation, readSpacing, readRescale}) {
@@ -226,6 +231,7 @@ LeftOutFrame leftOutFrame(const StackFrame& frame, const QString& reason)
     return {frame.imageUID, frame.isMultiFrame ? frame.frame : -1, reason};
 }
 
+/// What speaks against the image speaks against all its frames, so it is asked once and told once.
 QVector<StackFrame> stackFramesOf(const TagMap& image, QVector<LeftOutFrame>& leftOut)
 {
     const int count = qMax(1, integerOf(image, DCM_NumberOfFrames, 1));

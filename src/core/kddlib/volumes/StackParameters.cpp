@@ -87,6 +87,7 @@ struct FrameText
     DcmTagKey key;
 };
 
+// Plain images have them as attributes, so they are asked for frame by frame and found in either place.
 const FrameText kFrameTexts[] = {
     {DCM_PlanePositionSequence, DCM_ImagePositionPatient},
     {DCM_PlaneOrientationSequence, DCM_ImageOrientationPatient},
@@ -136,6 +137,7 @@ ParamBundle dicomBundle(const QVector<StackFrame>& slices)
     return bundle;
 }
 
+/// Names each slice by its image, and by its frame where the images have several.
 ParamBundle sopInstances(const QVector<StackFrame>& slices)
 {
     std::vector<std::string> names;
@@ -160,12 +162,14 @@ QVector<const TagMap*> imagesOf(const QVector<StackFrame>& slices)
     return images;
 }
 
+/// An image that was once compressed with loss says so for good, also when it is stored uncompressed now.
 bool isLossy(const TagMap& image)
 {
     QByteArray lossy;
     return image.findAndGetString(DCM_LossyImageCompression, lossy) && lossy.trimmed() == "01";
 }
 
+/// By Overlay Rows, which every plane has, also where its pixels are too long to be kept.
 int overlayPlanesOf(const TagMap& image)
 {
     int planes = 0;
@@ -205,6 +209,7 @@ void insertValues(ParamBundle& parameters, const StackValues& values, const Valu
     parameters.insert("DataWindowScale", Parameter::ofReals({values.scale()}));
     parameters.insert("DataWindowBias", Parameter::ofReals({values.bias()}));
     parameters.insert("PrecisionLossBits", Parameter::ofReals({values.bitLoss()}));
+    // Beside a range, too: a reader that knows of no ranges has this one value.
     if (values.hasPadding())
         parameters.insert("PaddingValue", Parameter::ofIntegers({values.paddingMin()}));
     if (values.hasPaddingRange()) {
@@ -223,8 +228,10 @@ void insertWindow(ParamBundle& parameters, const StackFrame& slice, const StackV
     const QVector<double> widths = numbersOf(slice.tags.text(group, DCM_WindowWidth));
     if (centers.isEmpty() || widths.isEmpty() || widths.first() <= 0)
         return;
+    // The image gives its window in physical values; the file counts in values of the lattice.
     const double center = (centers.first() - values.bias()) / values.scale();
     parameters.insert("WindowCenter", Parameter::ofReals({center}));
+    // A negative scale exchanges the ends of the window, whose width stays one.
     parameters.insert("WindowWidth", Parameter::ofReals({widths.first() / std::fabs(values.scale())}));
 }
 

@@ -60,6 +60,7 @@ bool isNear(double a, double b)
     return std::fabs(a - b) <= kSameSpacing * a;
 }
 
+/// A volume file names its slices either by images or by frames, so the two are never in one stack.
 bool areOfOneKind(const StackFrame& a, const StackFrame& b)
 {
     return a.columns == b.columns && a.rows == b.rows && a.isMultiFrame == b.isMultiFrame &&
@@ -78,6 +79,7 @@ QVector<StackFrames> groupedByKind(const QVector<StackFrame>& frames, QVector<Le
 {
     QVector<StackFrames> groups;
     for (const StackFrame& frame : frames) {
+        // With the first of a group, so that small differences do not add up from slice to slice.
         const auto isOfKind = [&](const StackFrames& group) { return areOfOneKind(*group.first(), frame); };
         const auto group = std::find_if(groups.begin(), groups.end(), isOfKind);
         if (group != groups.end())
@@ -116,6 +118,7 @@ QVector<StackFrames> partedByReference(const QVector<StackFrames>& groups, QVect
     return result;
 }
 
+/// Of at least two frames. Single steps are rounded; over a run that evens out.
 Vec3d meanStep(const StackFrames& run)
 {
     return (run.last()->position - run.first()->position) * (1.0 / (run.size() - 1));
@@ -129,6 +132,7 @@ double toleranceFor(const Vec3d& step)
 
 bool continues(const StackFrames& run, const StackFrame& next)
 {
+    // One frame goes on with any other: the second makes the step that the third is held against.
     if (run.size() < 2)
         return true;
     const Vec3d step = meanStep(run);
@@ -178,6 +182,7 @@ Result checkRun(const StackFrames& run)
     return checkSpacing(run);
 }
 
+/// The columns are the steps along each axis and the origin; they are stored row by row.
 Mat4f matrixOf(const Vec3d& x, const Vec3d& y, const Vec3d& z, const Vec3d& origin)
 {
     const auto f = [](double value) { return static_cast<float>(value); };
@@ -192,6 +197,8 @@ void widen(double from, double a, double b, double c, float& min, float& max)
     max = static_cast<float>(from + qMax(a, 0.0) + qMax(b, 0.0) + qMax(c, 0.0));
 }
 
+/// The first slice gives size, spacing and directions, in which all of
+/// them agree as far as their group demands.
 Stack stackOf(const StackFrames& run)
 {
     const StackFrame& first = *run.first();
@@ -233,6 +240,9 @@ void planGroup(const StackFrames& group, StackPlan& plan)
 
 }  // namespace
 
+/// Groups the frames of all images by geometry, parts the groups by Frame of Reference and then so that no
+/// two frames of a part lie in one plane, and cuts what is left into runs of equal steps. Each run that is
+/// long enough is a stack; whatever falls out on the way is told with its reason.
 StackPlan planStacks(const TagMap& series, FrameOfReference reference)
 {
     StackPlan plan;

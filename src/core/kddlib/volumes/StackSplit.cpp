@@ -52,6 +52,7 @@ const SplitKey kSplitKeys[] = {
 /// The plane of each frame, counted along the normal.
 QVector<int> planesOf(const StackFrames& frames)
 {
+    // Sorted, a new plane begins where a frame lies farther from the one before than rounding explains.
     QVector<double> along;
     QVector<int> order;
     for (int i = 0; i < frames.size(); ++i) {
@@ -140,6 +141,8 @@ double positionAlong(const StackFrame& like, const StackFrame& frame)
     return dot(frame.position, like.normal());
 }
 
+/// Tries the attributes in turn. The first one that divides the frames evenly parts them, and each part is
+/// split again in the same way; without one the order of the images decides.
 QVector<StackFrames> splitByPlane(const StackFrames& frames, QVector<LeftOutFrame>& leftOut)
 {
     const int most = mostInOnePlane(frames);

@@ -15,6 +15,7 @@ namespace
 
 constexpr int kMaxBins = 4096;
 
+/// The bits may differ: a stored value then means the same in all slices.
 bool haveOneRescale(const QVector<StackFrame>& slices)
 {
     const StackFrame& first = slices.first();
@@ -83,6 +84,7 @@ KxHistogram ValueCounts::histogram() const
     const int count = qMin(range + 1, kMaxBins);
     QVector<quint64> bins(count);
     for (int i = 0; i <= range; ++i) {
+        // The greatest value would begin a bin of its own behind the last one.
         const qint64 bin = range == 0 ? 0 : qMin<qint64>(qint64(i) * count / range, count - 1);
         bins[static_cast<int>(bin)] += mCounts.at(from + i - kLowest);
     }
@@ -97,6 +99,8 @@ StackValues::StackValues(const QVector<StackFrame>& slices)
         mapOntoCommon(slices);
 }
 
+/// The lattice has as many whole bytes as the slice of the most bits
+/// needs, and room for every value of that width.
 void StackValues::keepStored(const QVector<StackFrame>& slices)
 {
     const StackFrame& first = slices.first();
@@ -138,6 +142,8 @@ int StackValues::mapped(const StackFrame& slice, int stored) const
     if (slice.hasPadding && stored >= slice.paddingMin && stored <= slice.paddingMax)
         return 0;
     const double exact = (stored * slice.slope + slice.intercept - mBias) / mScale;
+    // Less than one beyond the ends is rounding, which is brought back
+    // below; what is no number is outside as well.
     if (!(exact > -1 && exact < mHighest + 1))
         return mLowest - 1;
     return qBound(mHasPadding ? 1 : 0, static_cast<int>(std::lround(exact)), mHighest);
@@ -179,6 +185,7 @@ Result StackValues::convert(const StackFrame& slice, const TypedData2D& stored, 
     allocatePixels(lattice);
     const bool ok = visitPixelType(stored.type, [&](auto zero) {
         using T = decltype(zero);
+        // Wider types were refused above; here they are only kept from being compiled.
         if constexpr (sizeof(T) <= 2)
             return convertAll(slice, valuesOf<T>(stored), lattice, counts);
         else

@@ -48,6 +48,7 @@ private:
     {
         if (slice.imageUID == mOpenUID && !mOpenUID.isEmpty())
             return {};
+        // First of all: a file that fails on the way must not count as the open one.
         mOpenUID.clear();
         const QByteArray path = mPathOf(slice.tags.image());
         if (path.isEmpty())
@@ -86,6 +87,7 @@ private:
     DcmFileFormat mFile;
 };
 
+/// For messages: the file where there is one, and the frame as people count, from 1.
 QString nameOf(const StackFrame& slice, const ImagePath& pathOf)
 {
     const QString path = QFile::decodeName(pathOf(slice.tags.image()));
@@ -105,6 +107,7 @@ Result writeSlices(const Stack& stack, const ImagePath& pathOf, const StackValue
         if (result.good())
             result = values.convert(slice, stored, lattice, counts);
         if (result.bad())
+            // A fault of the image is told with its file; the writer names the volume file itself.
             return result.within(nameOf(slice, pathOf));
         result = writer.writeSlice(i, lattice);
         if (result.bad())
@@ -113,6 +116,7 @@ Result writeSlices(const Stack& stack, const ImagePath& pathOf, const StackValue
     return {};
 }
 
+/// Where the slices have no common range the scale is infinite or 0, by which nothing can be divided.
 Result checkPlan(const Stack& stack, const StackValues& values)
 {
     if (std::isfinite(values.scale()) && std::isfinite(values.bias()) && values.scale() != 0)
@@ -137,6 +141,8 @@ Result writeStack(const Stack& stack, const ImagePath& pathOf, const QByteArray&
     if (!writer)
         return result;
 
+    // Range and histogram are known when all slices are written, so the parameters come after them. A
+    // writer that is not finished leaves no file.
     ValueCounts counts;
     result = writeSlices(stack, pathOf, values, *writer, counts);
     if (result.good())

@@ -21,6 +21,7 @@ namespace
 
 constexpr int kSixteenBitBuffer = 2;
 constexpr int kDefaultBitsStored = 8;
+// A tag file has two bytes for the number of bins and four for what is in each.
 constexpr int kMaxHistogramBins = 0x10000;
 constexpr quint64 kMaxHistogramTotal = quint64(1) << 32;
 
@@ -33,6 +34,7 @@ QByteArray sopUIDOf(const TagMap& image)
     return uid;
 }
 
+/// In the order that a reader of the tag file restores: by Instance Number and then by UID.
 struct SortedImage
 {
     TagMap* image;
@@ -91,6 +93,7 @@ bool hasSignedPixels(const TagMap& image)
     return image.findAndGetInt(DCM_PixelRepresentation, representation) && representation == 1;
 }
 
+/// An image that does not say how many bits it stores counts as one of 8.
 void addImage(RescaleSlopeCalculator& calculator, const TagMap& image)
 {
     int bits = 0;
@@ -132,6 +135,8 @@ SliceList::SliceList(const QVector<Slice>& slices)
 {
     if (slices.isEmpty())
         return;
+    // A list that does not begin with image 0 can only descend; whether
+    // it is a run at all is seen slice by slice.
     const SliceList run = ofRun(slices.first().image == 0 ? Run::Ascending : Run::Descending, slices.size());
     for (int i = 0; i < slices.size(); ++i) {
         if (slices.at(i).image != run.at(i).image || slices.at(i).frame != 0) {
@@ -163,6 +168,7 @@ const QVector<TagMap*>& Volume::images() const
     return mImages.list();
 }
 
+/// The images move together and get other numbers; a slice whose image has left names none.
 void Volume::closeGaps() const
 {
     const QVector<int> places = mImages.closeGaps();
@@ -245,6 +251,7 @@ void Volume::setGeometry(const Vec3i& dims, const Box3f& box, const Mat4f& trans
     mTransformation = transformation;
 }
 
+/// A slope of 0 is none: nothing was set, so it is computed from the images.
 float Volume::rescaleSlope() const
 {
     if (mRescaleSlope == 0)
@@ -289,6 +296,7 @@ void Volume::setPadding(const boost::optional<qint32>& value, const boost::optio
     mPaddingRangeLimit = rangeLimit;
 }
 
+/// "1.2-volume_part007.vol" has the suffix "volume_7", and "1.2-volume.vol" has "volume".
 QByteArray Volume::fileNameSuffix(const char* fileName)
 {
     const QByteArray name(fileName);
@@ -315,6 +323,7 @@ void Volume::setMultiFrameInfo(const std::vector<std::string>& frameIdentifiers)
     if (frameIdentifiers.empty()) {
         slices.resize(order.size());
         for (int i = 0; i < order.size(); ++i)
+            // The slices are those of the volume file, in its order; only the numbers of the images change.
             slices[order.at(i).position].image = i;
     }
     // Of several images of one UID the last answers.
@@ -325,6 +334,7 @@ void Volume::setMultiFrameInfo(const std::vector<std::string>& frameIdentifiers)
         const QByteArray identifier = QByteArray::fromStdString(each);
         const int dot = identifier.lastIndexOf('.');
         const int frame = dot >= 0 ? identifier.mid(dot + 1).toInt() : 0;
+        // An image that is not held stays unknown, so that the slices after it keep their places.
         slices.append({indexes.value(before(identifier, dot), -1), frame});
     }
     setSlices(slices);
@@ -350,6 +360,7 @@ void Volume::attachImages(int volumeIndex, const QVector<TagMap*>& images)
     setImages(images, nullptr);
     if (numImages() == 0 || !hasSignedPixels(*image(0)))
         return;
+    // A record has 16 bits for each and no sign: only the images tell whether their values have one.
     extendSign(mPaddingValue);
     extendSign(mPaddingRangeLimit);
 }
@@ -363,6 +374,7 @@ bool Volume::arrangeLike(const QVector<TagMap*>& images)
     QHash<TagMap*, int> places;
     for (int i = 0; i < order.size(); ++i)
         places.insert(order.at(i), i);
+    // As sets: the same images in another order are what this is for.
     if (QSet<TagMap*>(former.begin(), former.end()) != QSet<TagMap*>(order.begin(), order.end()))
         return false;
     QVector<Slice> slices;

@@ -19,6 +19,8 @@ const char* const kSopInstanceUIDs = "SOPInstanceUIDs";
 const char* const kHistogram = "Histogram";
 const char* const kNumberOfFrames = "G0028-0008";
 
+/// Without a lattice of three dimensions there is no geometry, and the
+/// volume counts as one of which nothing is known.
 Vec3i dimsOf(const OrlanMesh& mesh)
 {
     const Lattice* lattice = mesh.findLattice(kLevel0, 3);
@@ -48,6 +50,7 @@ Mat4f matrixOf(const ParamBundle& parameters)
     return matrix;
 }
 
+/// A value that is not there is no 0, which might be a measured one.
 boost::optional<qint32> optionalInteger(const ParamBundle& parameters, const char* name)
 {
     if (!parameters.contains(name))
@@ -88,6 +91,7 @@ KxHistogram histogramOf(const OrlanMesh& mesh, const QByteArray& path)
     if (result.good() && range.size() == 2)
         return {counts, range.at(0), range.at(1)};
     const Lattice* lattice = mesh.findLattice(kLevel0, 3);
+    // A range that is there but is none is not guessed at; one that is missing may follow from the type.
     if (result.good() && range.isEmpty() && lattice != nullptr) {
         KxHistogram histogram = ofEveryValue(counts, lattice->type);
         if (histogram.numBins() > 0)
@@ -132,10 +136,12 @@ bool VolumeInfo::readHeader(const OrlanMesh& mesh, const QByteArray& path)
     numOverlayPlanes = parameters.integer("NumberOfOverlayPlanes", 0);
     paddingValue = optionalInteger(parameters, "PaddingValue");
     if (parameters.contains("PaddingRangeMin") && parameters.contains("PaddingRangeMax")) {
+        // A range takes the place of the single value.
         paddingValue = optionalInteger(parameters, "PaddingRangeMin");
         paddingRangeLimit = optionalInteger(parameters, "PaddingRangeMax");
     }
     histogram = histogramOf(mesh, path);
+    // Told and taken all the same, for the images are known.
     if (dims.z != static_cast<int>(frameIdentifiers.size()))
         LogFile::warnf("Found %d UIDs but %d slices in 3D volume %s",
                        static_cast<int>(frameIdentifiers.size()), dims.z, path.constData());
@@ -155,6 +161,7 @@ void VolumeInfo::nameImages(bool haveFrames)
     imageUIDs.clear();
     for (const std::string& identifier : frameIdentifiers) {
         const std::string uid = withoutFrame(identifier);
+        // Each image once, in the order of its first frame.
         if (seen.insert(uid).second)
             imageUIDs.push_back(uid);
     }

@@ -33,6 +33,7 @@ struct CloudNames
     std::string_view object;
 };
 
+/// Any number of "/" may stand behind the scheme, as in "gs://".
 CloudNames namesIn(std::string_view address)
 {
     address.remove_prefix(kScheme.size());
@@ -76,6 +77,7 @@ bool hasDotFolder(std::string_view path)
     for (std::size_t start = 0; start <= path.size();) {
         const std::size_t end = std::min(path.find('/', start), path.size());
         std::string part(path.substr(start, end - start));
+        // Servers unescape before they resolve, so an escaped dot is one.
         for (const char* const dot : {"%2e", "%2E"}) {
             for (std::size_t at = 0; (at = part.find(dot)) != std::string::npos;)
                 part.replace(at, 3, ".");

@@ -10,6 +10,7 @@ namespace
 {
 
 constexpr int kStep = 8;  // [bytes]
+// Castagnoli's, with its bits reversed.
 constexpr quint32 kPolynomial = 0x82F63B78;
 
 /// Row n takes a byte that has n bytes behind it in its step, so that the eight of a step do not wait for each other.
@@ -24,6 +25,7 @@ constexpr Tables makeTables()
             value = (value >> 1) ^ ((value & 1) ? kPolynomial : 0);
         tables[0][byte] = value;
     }
+    // Each row lets one zero byte follow what the row before stands for.
     for (std::size_t row = 1; row < tables.size(); ++row) {
         for (std::size_t byte = 0; byte < 256; ++byte) {
             const quint32 value = tables[row - 1][byte];
@@ -37,6 +39,7 @@ constexpr Tables kTables = makeTables();
 
 quint32 afterStep(const uchar* bytes, quint32 value)
 {
+    // The checksum so far acts on the first four bytes of the step.
     const quint64 step = qFromLittleEndian<quint64>(bytes) ^ value;
     quint32 next = 0;
     for (std::size_t i = 0; i < kStep; ++i)

@@ -81,6 +81,7 @@ Result sign(const QByteArray& text, const QByteArray& privateKey, QByteArray& si
     return {};
 }
 
+/// The alphabet for addresses and no padding, as tokens have it.
 QByteArray encoded(const QByteArray& bytes)
 {
     return bytes.toBase64(QByteArray::Base64UrlEncoding | QByteArray::OmitTrailingEquals);

@@ -93,6 +93,7 @@ void KxCurlUploadSession::start()
 {
     RetryPolicy policy;
     const bool isOpen = repeat(policy, kStart, [this] {
+        // What an earlier attempt was told is not the session of this one.
         mSessionUrl.clear();
         const int code =
             exchange("POST", mTarget.url,
@@ -105,12 +106,15 @@ void KxCurlUploadSession::start()
         throw RetryPolicyExhaustedError(kChunkExhausted, mLastFault);
 }
 
+/// The chunk counts in the checksums once, however often it is sent. Each attempt after the first begins by
+/// asking how far the storage has come, and goes on from there.
 void KxCurlUploadSession::uploadChunk(const QByteArray& data, Chunk kind)
 {
     mChecksums.add(data);
     const quint64 end = mChecksums.length();
     if (kind == Chunk::Last)
         mTotal = end;
+    // The last chunk is done when the object is made, any other when its last byte is confirmed.
     const auto isDone = [&] { return mTotal ? mIsComplete : mNextOffset == end; };
 
     RetryPolicy policy;
@@ -143,11 +147,13 @@ void KxCurlUploadSession::sendChunk(const QByteArray& rest, Chunk kind)
     const quint64 start = mNextOffset;
     const quint64 end = start + static_cast<quint64>(rest.size());
     std::string range = "Content-Range: bytes ";
+    // An empty rest has no range; it only says how long the object is.
     range += rest.isEmpty() ? "*" : std::to_string(start) + '-' + std::to_string(end - 1);
     range += '/' + (kind == Chunk::Last ? std::to_string(end) : std::string("*"));
     // Before it is sent: of a transfer that breaks off all bytes may have come.
     mSentEnd = std::max(mSentEnd, end);
     const int code = exchange("PUT", mSessionUrl, {contentLength(rest.size()), range}, rest);
+    // Any other code leaves the position where it was, so that the attempt counts as failed.
     if (code != kResumeIncomplete && !mIsComplete)
         isInVain(code, kChunk);
     if (!mIsComplete && mNextOffset != end)
@@ -255,6 +261,7 @@ void KxCurlUploadSession::takeLocation(const std::string& location)
 void KxCurlUploadSession::takeRange(const std::string& range)
 {
     constexpr std::string_view kPrefix = "bytes=0-";
+    // Of another form it says nothing of how far the storage has come.
     if (range.compare(0, kPrefix.size(), kPrefix) != 0)
         return;
     quint64 last = 0;

@@ -35,6 +35,7 @@ bool KxCurlUploadStreambuf::guard(const char* step, Step work)
     }
 }
 
+/// Not copied: the session keeps nothing of it beyond the call.
 QByteArray KxCurlUploadStreambuf::pending() const
 {
     return QByteArray::fromRawData(pbase(), static_cast<int>(pptr() - pbase()));

@@ -19,7 +19,9 @@ namespace Kdd
 namespace
 {
 
+// The clock counts steps of 100 ns.
 constexpr qint64 kTicksPerSecond = 10'000'000;
+// A token that is handed out has to last for the request that takes it along.
 constexpr qint64 kMargin = 500 * kTicksPerSecond;
 constexpr qint64 kTokenRequestLifetime = 3600;  // [s]
 constexpr double kLongestLifetime =
@@ -124,6 +126,8 @@ Result KxGoogleAuth::Private::makeForm(qint64 now, QByteArray& form) const
     return signing;
 }
 
+/// Signs who the account is and exchanges that for a token. Empty, with the
+/// reason logged, when there is none to be had.
 QByteArray KxGoogleAuth::Private::fetch(const Exchange& exchange, qint64 now)
 {
     QByteArray form;
@@ -146,6 +150,7 @@ QByteArray KxGoogleAuth::Private::takeAnswer(const QJsonDocument& answer, qint64
 {
     const QString token = answer.object().value(QLatin1String("access_token")).toString();
     const QString type = answer.object().value(QLatin1String("token_type")).toString();
+    // Without a lifetime the token counts as expired: it serves this request, and the next one asks anew.
     const double lifetime = answer.object().value(QLatin1String("expires_in")).toDouble();
     // The former token stays: until its own margin it is as good as before.
     if (!isHeaderText(token) || !isHeaderText(type)) {
@@ -187,6 +192,7 @@ bool KxGoogleAuth::loadCredentialsFromJson(const QJsonObject& object, const char
 void KxGoogleAuth::setScopes(const std::vector<std::string>& scopes)
 {
     const std::lock_guard lock(mPrivate->mutex);
+    // The present token is good for what was asked for before, so it is given up.
     mPrivate->scopes = scopes;
     mPrivate->header.clear();
 }

@@ -18,6 +18,7 @@ std::chrono::milliseconds RetryPolicy::nextDelay()
     if (!exhausted())
         ++mAttempts;
     if (exhausted())
+        // After the last failure there is nothing to wait for.
         return std::chrono::milliseconds(0);
     const std::chrono::milliseconds delay = mDelay + jitter();
     const std::chrono::milliseconds longer(std::llround(static_cast<double>(mDelay.count()) * mMultiplier));

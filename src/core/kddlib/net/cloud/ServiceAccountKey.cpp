@@ -38,6 +38,7 @@ Result readServiceAccountKey(const QJsonObject& object, const char* source, Serv
     const std::string type = textOf(object, "type");
     if (type != kType)
         return failure("Credential type is '%1' in %2, expected '%3'", type.c_str(), source, kType);
+    // Read aside: a key that lacks something leaves the former one in force.
     ServiceAccountKey read;
     const std::pair<const char*, std::string&> required[] = {
         {"private_key_id", read.id}, {"private_key", read.privateKey}, {"client_email", read.clientEmail}};

@@ -56,6 +56,7 @@ UploadChecksums::Claims UploadChecksums::claimsOf(const KxHttpStatus& status, co
     const std::string* const header = findHeader(status, "x-goog-hash");
     const QByteArray hashes = header ? QByteArray::fromStdString(*header) : QByteArray();
     for (const QByteArray& hash : hashes.split(',')) {
+        // The first one: base64 may end in others.
         const int end = hash.indexOf('=');
         claims[hash.left(end).trimmed().toStdString()] = hash.mid(end + 1).trimmed().toStdString();
     }

@@ -58,6 +58,7 @@ bool BufferedFileProducer::fillWindow()
 offile_off_t BufferedFileProducer::read(void* bytes, offile_off_t count)
 {
     auto* to = static_cast<char*>(bytes);
+    // No further than the file reached when it was opened, whatever a length in the data says.
     qint64 left = good() ? qMin<qint64>(count, avail()) : 0;
     const qint64 wanted = left;
     while (left > 0) {

@@ -23,7 +23,9 @@ namespace
 {
 
 constexpr qint64 kMaxFileBytes = qint64{1} << 30;
+// Bytes of any content that stand before the prefix.
 constexpr qint64 kPreamble = 128;
+// A file may be damaged in a thousand places, and its warning is one line.
 constexpr int kNamesToTell = 10;
 const QByteArray kSequenceEnd("\xfe\xff\xdd\xe0\0\0\0\0", 8);
 
@@ -73,6 +75,7 @@ E_TransferSyntax passMetaHeader(const QByteArray& bytes, qint64& at)
 {
     if (bytes.mid(kPreamble, 4) != "DICM")
         return EXS_Unknown;
+    // The meta header is written so in every file, whatever it declares of the dataset.
     const ElementScan scan(bytes, DcmXfer(EXS_LittleEndianExplicit));
     QByteArray uid;
     ElementScan::Element element;
@@ -80,6 +83,7 @@ E_TransferSyntax passMetaHeader(const QByteArray& bytes, qint64& at)
         if (element.end < 0)
             return EXS_Unknown;
         if (element.key == DCM_TransferSyntaxUID)
+            // Up to the zero byte by which UIDs are padded.
             uid =
                 QByteArray(
                     bytes.mid(static_cast<int>(element.value), static_cast<int>(element.end - element.value))
@@ -105,6 +109,7 @@ qint64 frameBytes(DcmItem& dataset)
         return 0;
     if (dataset.findAndGetSint32(DCM_NumberOfFrames, frames).bad())
         frames = 1;
+    // In floating point, where no product of claimed numbers wraps.
     const double size = double(rows) * columns * samples * (bits / 8) * frames;
     return size > 0 && size <= double(kMaxFileBytes) ? static_cast<qint64>(size) : 0;
 }
@@ -134,6 +139,7 @@ public:
         // Last, because the number of bytes that the frames need stands in other elements.
         if (mNativePixels.end > 0)
             takeNativePixels();
+        // All together once more: what is sound alone must also be so side by side.
         return parse(mSound, mSyntax, file);
     }
 
@@ -188,6 +194,7 @@ private:
     bool take(const QByteArray& element)
     {
         DcmFileFormat alone;
+        // Exactly one must come of it: damage inside may read as several.
         if (parse(element, mSyntax, alone).bad() || alone.getDataset()->card() != 1)
             return false;
         mSound.append(element);
@@ -215,6 +222,7 @@ private:
         const qint64 size = element.end - element.value;
         const E_TransferSyntax declared = std::exchange(mSyntax, EXS_LittleEndianExplicit);
         const qint64 expected = parse(mSound, mSyntax, others).good() ? frameBytes(*others.getDataset()) : 0;
+        // Values have an even length.
         const bool isSized = expected > 0 && size == expected + expected % 2;
         if (isSized && take(pixels)) {
             mLeftOut.append(QStringLiteral("the declared compression"));
@@ -256,6 +264,7 @@ OFCondition readDamagedDicomFile(const char* path, DcmFileFormat& file, QString&
 
 OFCondition readAsRegistered(const char* path, DcmFileFormat& file, const OFCondition& strict)
 {
+    // Only for a file that failed is the database asked; sound ones cost it no question.
     if (!Kxg::IsDamagedFile(path))
         return strict;
     QString leftOut;

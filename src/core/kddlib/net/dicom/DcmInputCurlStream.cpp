@@ -5,6 +5,7 @@
 namespace Kdd
 {
 
+/// The base class only keeps where the producer is, which is made after it.
 DcmInputCurlStream::DcmInputCurlStream(KxCurlDownloadStream&& stream)
     : DownloadInputStream(mProducer)
     , mProducer(std::move(stream))

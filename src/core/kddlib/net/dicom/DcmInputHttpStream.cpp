@@ -13,6 +13,7 @@ void DcmHttpProducer::request(const std::string& url, const std::string& bearerT
     setStream(KxCurlClient::instance().read(url, headers, false));
 }
 
+/// The base class only keeps where the producer is, which is made after it.
 DcmInputHttpStream::DcmInputHttpStream()
     : DownloadInputStream(mProducer)
 {

@@ -9,6 +9,7 @@ OFCondition parseStream(DcmInputStream& stream, DcmFileFormat& file, const Parse
     OFCondition condition = stream.status();
     if (condition.bad())
         return condition;
+    // From here on what `file` held is gone, also when reading fails.
     file.clear();
     file.setReadMode(options.mode);
     file.transferInit();

@@ -13,7 +13,9 @@ namespace Kdd
 namespace
 {
 
+// The parser asks for a few bytes at a time.
 constexpr qint64 kWindow = 64 * 1024;
+// For what the parser steps back over.
 constexpr qint64 kHistory = 4 * 1024;
 
 makeOFConditionConst(EC_EndOfFile, OFM_dcmdata, 0x310, OF_error, "End-of-file reached on input operation");
@@ -38,6 +40,7 @@ DownloadProducer::DownloadProducer(KxCurlDownloadStream&& stream)
 void DownloadProducer::setStream(KxCurlDownloadStream&& stream)
 {
     mStream = std::move(stream);
+    // A page that tells of an error is no object, be it one that could be parsed.
     mStatus = mStream.httpStatus().ok() ? EC_Normal : EC_ReadError;
     mWindow.clear();
     mWindowStart = 0;
@@ -114,6 +117,7 @@ bool DownloadProducer::fillWindow()
 qint64 DownloadProducer::readBeyondWindow(char* to, qint64 count)
 {
     const qint64 got = fetch(to, count);
+    // These bytes lie behind the window, whose new content is their end.
     mWindowStart = windowEnd();
     keepHistory(to, got);
     if (got < count)

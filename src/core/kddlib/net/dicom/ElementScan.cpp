@@ -51,10 +51,12 @@ qint64 ElementScan::endOfWholeItems(qint64 at, int& items) const
 bool ElementScan::readHead(qint64 at, bool isExplicit, Head& head) const
 {
     const qint64 left = mBytes.size() - at;
+    // No head is shorter: key and length, or key, VR and a short length.
     if (left < 8)
         return false;
     head.key = DcmTagKey(word(at), word(at + 2));
     head.isUnknown = false;
+    // Items and delimiters have no VR in any syntax.
     if (!isExplicit || head.key.getGroup() == kDelimiters) {
         head.length = doubleWord(at + 4);
         head.value = at + 8;

@@ -25,6 +25,7 @@ using Mode = KxDcmFileLoader::Mode;
 
 constexpr char kUsualPort[] = "8181";
 constexpr Uint32 kReadAll = 0xffffffff;
+// Longer values stay in the file; what the library keeps of an image is mostly shorter.
 constexpr Uint32 kOwnBound = 4096;  // [bytes]
 
 /// DCMTK's interfaces differ in the width of the bound.
@@ -120,6 +121,7 @@ OFCondition loadLocal(const char* name, DcmFileFormat& file, const ParseOptions&
 OFCondition load(const char* name, DcmFileFormat& file, Mode mode, ParseOptions options)
 {
     const bool isUrl = KxCurlClient::isUrl(name);
+    // Here, so that a change of the default holds for loaders that were made before.
     if (mode == Mode::Default)
         mode = KxDcmFileLoader::defaultMode();
     // A download cannot be read a second time, and the other modes are for callers who want all values.

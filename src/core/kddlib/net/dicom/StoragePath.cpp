@@ -30,6 +30,7 @@ bool isHost(std::string_view text)
     return !text.empty() && std::all_of(text.begin(), text.end(), isLetter);
 }
 
+/// Names come from systems of both kinds, so both separators are taken.
 StoragePath parse(std::string name)
 {
     std::replace(name.begin(), name.end(), '\\', '/');

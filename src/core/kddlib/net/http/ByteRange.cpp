@@ -19,6 +19,7 @@ std::optional<qint64> parseByteCount(std::string_view digits)
     qint64 count = 0;
     const char* const end = digits.data() + digits.size();
     const auto [stop, error] = std::from_chars(digits.data(), end, count);
+    // An empty text is an error already, so there is a first character to look at. A count has no sign.
     const bool isNumber = error == std::errc() && stop == end && digits.front() != '-';
     return isNumber ? std::optional(count) : std::nullopt;
 }

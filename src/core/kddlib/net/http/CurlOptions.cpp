@@ -29,6 +29,7 @@ void CurlOptions::setVerification()
 {
     const bool verifies = ExResource::verifiesTls();
     set(CURLOPT_SSL_VERIFYPEER, verifies ? 1L : 0L);
+    // 2 demands that the certificate names the host.
     set(CURLOPT_SSL_VERIFYHOST, verifies ? 2L : 0L);
     const QByteArray caFile = ExResource::tlsCaFile();
     // A path that leads nowhere must not break a site that does not verify at all.
@@ -49,6 +50,7 @@ void CurlOptions::setTransport(const std::string& url, const CurlShare& share,
     set(CURLOPT_PATH_AS_IS, 1L);
     // An address comes from outside and must not lead to local files or to other services.
     set(CURLOPT_PROTOCOLS_STR, "http,https");
+    // Else curl may end slow look-ups of names by a signal, which would meet any thread.
     set(CURLOPT_NOSIGNAL, 1L);
     // What a proxy says when it opens a tunnel is not the server's answer.
     set(CURLOPT_SUPPRESS_CONNECT_HEADERS, 1L);

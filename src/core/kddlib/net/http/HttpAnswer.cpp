@@ -33,6 +33,7 @@ qint64 objectLengthOf(const KxHttpStatus& status)
             return parseByteCount(*total).value_or(0);
         LogFile::warnf("Could not parse Content-Range: %s", range->c_str());
     }
+    // Without a range that tells it, the length of the body is taken for that of the object.
     if (const std::string* const length = findHeader(status, "content-length"))
         return parseByteCount(*length).value_or(0);
     if (const std::string* const encoding = findHeader(status, "transfer-encoding");

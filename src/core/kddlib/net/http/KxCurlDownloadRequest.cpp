@@ -102,10 +102,12 @@ void KxCurlDownloadRequest::addHeaders(const PreparedRequest& prepared)
 
 std::size_t KxCurlDownloadRequest::read(char* to, std::size_t count)
 {
+    // Set before anything else: from here on curl's callbacks deliver straight to the reader.
     mTo = to;
     mWanted = count;
     mDelivered = 0;
     deliver();
+    // What has arrived before may be enough; the transfers are then only moved on now and then.
     if (!hasReader())
         mMulti->noteRead(*this, count);
     else if (!mDone && resume())
@@ -161,6 +163,8 @@ std::string KxCurlDownloadRequest::reasonOf(CURLcode code) const
     return cure.empty() ? reason : reason + ". " + cure;
 }
 
+/// Called when curl is done with the transfer, be it well or badly. An answer
+/// without body has not been judged by then.
 void KxCurlDownloadRequest::complete(CURLcode code)
 {
     mDone = true;
@@ -204,6 +208,7 @@ std::size_t KxCurlDownloadRequest::takeBody(const char* bytes, std::size_t lengt
         return 0;
     }
     deliver();
+    // What arrived earlier goes first, so that the reader gets the bytes in their order.
     const std::size_t direct = std::min(length, mWanted - mDelivered);
     // Decided before anything is copied, because after a pause curl offers the same bytes again.
     if (length - direct > mSpill.room()) {

@@ -50,6 +50,7 @@ void KxCurlDownloadStream::close()
     if (!mBuffer)
         return;
     httpStatus();
+    // The status was copied just before, for the requests that have it go now.
     mBuffer->close();
 }
 

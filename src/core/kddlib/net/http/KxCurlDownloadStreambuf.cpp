@@ -59,9 +59,11 @@ KxCurlDownloadRequest* KxCurlDownloadStreambuf::currentRequest()
 
 void KxCurlDownloadStreambuf::fetchWhole()
 {
+    // A new request without range; the one that it replaces has delivered nothing.
     mRequests.front() = std::make_unique<KxCurlDownloadRequest>(mOrigin, std::nullopt);
 }
 
+/// Once, when the first answer has told the length and the version of the object.
 void KxCurlDownloadStreambuf::plan(const ContentRange& first)
 {
     mPlanned = true;

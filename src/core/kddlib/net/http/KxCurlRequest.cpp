@@ -50,6 +50,7 @@ void KxCurlRequest::perform()
     try {
         run();
     } catch (const std::exception& fault) {
+        // For whoever asks the status when the exception is long caught.
         mStatus.failed = true;
         mStatus.failure = fault.what();
         throw;

@@ -23,6 +23,7 @@ ObjectVersion ObjectVersion::of(const KxHttpStatus& response)
 
 bool operator==(const ObjectVersion& a, const ObjectVersion& b)
 {
+    // Of `b` nothing need be asked: where this counts, the two have the same.
     const bool hasStrong = !a.entityTag.empty() || !a.generation.empty();
     return a.entityTag == b.entityTag && a.generation == b.generation &&
            (hasStrong || a.lastModified == b.lastModified);

@@ -19,6 +19,7 @@ void SpillBuffer::append(const char* bytes, std::size_t count)
 {
     while (count > 0) {
         const std::size_t offset = mEnd % SpillBlocks::kBlockSize;
+        // The last block is full, or there is none yet.
         if (mEnd == mHeld.size() * SpillBlocks::kBlockSize)
             mHeld.push_back(mBlocks.take());
         const std::size_t part = std::min(count, SpillBlocks::kBlockSize - offset);

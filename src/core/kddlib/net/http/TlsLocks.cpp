@@ -14,6 +14,7 @@ namespace Kdd
 namespace
 {
 
+// Of the callback's mode: with it a lock is asked for, without it let go.
 constexpr int kLockBit = 1;
 
 using Locks = std::unique_ptr<std::mutex[]>;

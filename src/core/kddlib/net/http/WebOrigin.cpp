@@ -36,6 +36,7 @@ std::string partOf(const Url& url, CURLUPart part, unsigned int flags = 0)
 WebOrigin originOf(const std::string& url)
 {
     const Url parts(curl_url());
+    // What curl itself cannot take apart it could not connect to either.
     if (!parts || curl_url_set(parts.get(), CURLUPART_URL, url.c_str(), 0) != CURLUE_OK)
         return {};
     // With the usual port named, so that an address with it and one without are one origin.

@@ -17,6 +17,7 @@ QByteArray readUntilEnd(std::istream& stream)
     qint64 got = 0;
     while (got < kMaxResponseSize && stream.read(bytes.data() + got, bytes.size() - got).gcount() > 0) {
         got += stream.gcount();
+        // Grown before it is full: a read without room would look like the end.
         if (got > bytes.size() / 2)
             bytes.resize(static_cast<int>(qMin(2 * qint64(bytes.size()), kMaxResponseSize)));
     }

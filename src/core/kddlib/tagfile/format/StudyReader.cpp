@@ -152,6 +152,7 @@ private:
         auto study = std::make_shared<TagMap>();
         study->deserialize(record, nullptr, mContext);
         const QByteArray uid = study->uid(TagMap::StudyLevel);
+        // Another study is no damage; a record that cannot be read is, whoever it is of.
         if (record.failed() || (mWanted != nullptr && uid != mWanted))
             return !record.failed();
         mStudy = study.get();
@@ -192,6 +193,7 @@ private:
 
     TagMap* readBelow(KxMsg& record, TagMap* parent)
     {
+        // Hung up before it is read: the tree then owns it, also when the record proves damaged.
         auto* node = new TagMap;
         parent->appendChild(node);
         node->deserialize(record, parent, mContext);
@@ -219,12 +221,14 @@ Result readStudy(QDataStream& in, const StudyRequest& request, StudyTree& tree, 
     QByteArray stored;
     QList<QByteArray> blobs;
     qint32 promised = 0;
+    // Without a length of its own the old body runs to the end of the file.
     if (header.layout == kOldLayout) {
         stored = readAtMost(in, kMaxStoredBody);
     } else {
         qint32 size = 0;
         in >> size;
         stored = readAtMost(in, qMin<qint64>(size, kMaxStoredBody));
+        // A size beyond the bound gets fewer bytes than it asks for, and so counts as cut off.
         if (in.status() != QDataStream::Ok || size < 0 || stored.size() < size)
             return refuse(kTruncated);
         blobs = readBlobs(in, promised);

@@ -56,6 +56,8 @@ public:
     /// Fails when the study must not be written.
     Result write(const QByteArray& uid, const TagMap& study)
     {
+        // The file's place and its readers go by the UID of the index:
+        // under another one nobody would find the study.
         if (study.uid(TagMap::StudyLevel) != uid)
             return Result::failure(QStringLiteral("Tag file of study %1 would hold study %2")
                                        .arg(QString::fromLatin1(uid), nameOf(study.uid(TagMap::StudyLevel))));
@@ -135,6 +137,7 @@ Result writeStudy(StudyTree& tree, TagFileSettings::CompressionMode mode, QDataS
     StudyBodyWriter writer(tree);
     for (auto study = tree.studies().cbegin(); study != tree.studies().cend(); ++study) {
         for (TagMap* series : study.value()->children()) {
+            // Before the records are made, for it changes what the images say of their volumes.
             Result settled = VolumeSettling::settle(*series);
             if (settled.bad())
                 return settled;
@@ -147,6 +150,7 @@ Result writeStudy(StudyTree& tree, TagFileSettings::CompressionMode mode, QDataS
     }
     const QByteArray& body = writer.body();
     const QList<QByteArray>& blobs = writer.blobs();
+    // The reader's bounds are those of the body before compression, so that is what is measured.
     if (body.size() > kMaxBodySize || sizeAround(blobs) + body.size() > kMaxFile)
         return Result::failure(QLatin1String(kTooLarge));
     const QByteArray stored = compressed(body, mode);

@@ -8,6 +8,7 @@ namespace Kdd
 namespace
 {
 
+/// In 64 bits: each picture fits an int, but not all together.
 qint64 totalSize(const QList<QByteArray>& blobs)
 {
     qint64 total = 0;

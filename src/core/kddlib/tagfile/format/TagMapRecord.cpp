@@ -46,6 +46,7 @@ VrCode storedVr(const TagElement& element)
 {
     if (element.isSequence() && !element.markedAsMissing() && !element.markedAsOmitted())
         return VrCode::SQ;
+    // A number that the one byte of the file does not hold would come back as another VR.
     const bool fits = static_cast<quint32>(element.vr()) <= static_cast<quint32>(VrCode::Omitted);
     return element.vr() == VrCode::SQ || !fits ? VrCode::UN : element.vr();
 }
@@ -109,6 +110,7 @@ void TagMap::refuse(KxMsg& out, WriteContext& context, const char* reason)
 
 void TagMap::writeElement(KxMsg& out, const DcmTagKey& key, const TagElement& element, WriteContext& context)
 {
+    // Pictures are compressed already and stand behind the body; here is only which one it is.
     if (key == kPreview && !element.markedAsMissing() && !element.markedAsOmitted()) {
         writeKey(out, kPreviewIndex, VrCode::IS);
         writeValue(out, QByteArray::number(context.blobs.size()));
@@ -168,6 +170,7 @@ void TagMap::deserialize(KxMsg& in, TagMap* parent, RecordContext& context)
             element = std::make_unique<TagElement>(vr, QByteArray());
         } else {
             const int length = readLength(in);
+            // Also of a VR that this release does not know: all but sequences and markers have a length.
             element = std::make_unique<TagElement>(vr, in.read(length));
         }
         if (key == kPreviewIndex && element != nullptr) {
@@ -204,6 +207,7 @@ std::unique_ptr<TagElement> TagMap::readSequence(KxMsg& in, const DcmTagKey& key
         item->deserialize(record, itemAbove, context);
         if (record.failed())
             in.setFailed();
+        // Linked as it is: what was read is already only what differs from the item above.
         item->mParent = itemAbove;
         if (itemAbove != nullptr)
             itemAbove->mChildren.append(item);

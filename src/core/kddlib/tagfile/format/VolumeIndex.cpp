@@ -23,6 +23,7 @@ QVector<int> volumeIndexes(const TagElement& element)
 {
     if (element.vr() != VrCode::OB) {
         bool ok = false;
+        // An index that one byte does not hold is stored as a longer number, and is then the only one.
         const int index = element.valueAsInt(&ok, 0);
         return ok ? QVector<int>{index} : QVector<int>();
     }
@@ -67,6 +68,8 @@ void addVolumeIndex(TagMap& image, int index)
         image.putAndInsertInt(kVolumeIndex, index);
     } else if (held->vr() == VrCode::OB) {
         QByteArray indexes = held->value();
+        // One from 256 on is cut here. Before it is written,
+        // settling notices that other images would be found.
         indexes.append(static_cast<char>(index));
         image.putAndInsertValue(kVolumeIndex, VrCode::OB, indexes);
     }
@@ -75,6 +78,7 @@ void addVolumeIndex(TagMap& image, int index)
 void nameVolumes(TagMap& series)
 {
     series.deleteElement(kVolumeIndex);
+    // The study may hold the value for all its series.
     if (series.findElement(kVolumeIndex) != nullptr)
         series.markAsMissing(kVolumeIndex);
     for (TagMap* image : series.children())

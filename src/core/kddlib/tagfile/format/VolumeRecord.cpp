@@ -67,6 +67,7 @@ struct SliceTraits
 SliceTraits traitsOf(const SliceList& slices)
 {
     SliceTraits traits;
+    // A run needs no look at its slices: its largest number follows from its length.
     traits.haveShortNumbers = slices.size() <= kMaxShort;
     for (int i = 0; i < slices.size() && slices.run() == SliceList::Run::None; ++i) {
         const Slice slice = slices.at(i);
@@ -80,6 +81,7 @@ SliceTraits traitsOf(const SliceList& slices)
 SliceCode sliceCode(const SliceList& slices, int numImages, const Vec3i& dims)
 {
     const int count = slices.size();
+    // The reader has the count of the short codes from the dimensions, and without columns takes it for 0.
     const bool dimsTellCount = count == dims.z && count == countFromDims(dims);
     const bool onePerImage = count > 0 && count == numImages;
     if (onePerImage && dimsTellCount && count <= kMaxRun && slices.run() != SliceList::Run::None)
@@ -129,6 +131,7 @@ qint32 readNumber(KxMsg& in, SliceCode code)
 
 SliceList readRun(KxMsg& in, SliceCode code, int count)
 {
+    // A run takes no bytes in the file, so its length needs a bound of its own.
     if (count < 0 || count > kMaxRun) {
         in.setFailed();
         return {};
@@ -140,6 +143,7 @@ SliceList readRun(KxMsg& in, SliceCode code, int count)
 SliceList readListed(KxMsg& in, SliceCode code, int count)
 {
     const int sliceSize = (isWide(code) ? 4 : 2) * (hasFrames(code) ? 2 : 1);
+    // Held against what is left before memory is taken.
     if (count < 0 || count > in.remaining() / sliceSize) {
         in.setFailed();
         return {};
@@ -185,6 +189,7 @@ void writePreview(KxMsg& out, const QByteArray& jpeg, QList<QByteArray>& blobs)
     TagMap::writeLength(out, jpeg.isEmpty() ? 0 : blobs.size());
 }
 
+/// The low 16 bits; whether they are signed is known again when the volume has its images.
 void writePadding(KxMsg& out, const boost::optional<qint32>& value)
 {
     out << static_cast<quint8>(value ? 1 : 0);
@@ -213,6 +218,7 @@ void writeHistogram(KxMsg& out, const KxHistogram& histogram)
 {
     out << shortLimit(histogram.minimum()) << shortLimit(histogram.maximum());
     out << static_cast<quint16>(histogram.numBins());
+    // A volume whose counts do not fit 32 bits has no extra data.
     for (const quint64 bin : histogram.bins())
         out << static_cast<quint32>(bin);
 }
@@ -268,6 +274,7 @@ void TagMap::serializeVolumes(KxMsg& out, QList<QByteArray>& blobs) const
         out.setFailed();
         return;
     }
+    // In a message of its own, because its length stands before it.
     KxMsg list;
     writeLength(list, volumes().size());
     for (const Volume* volume : volumes()) {
@@ -298,6 +305,7 @@ void TagMap::deserializeVolumes(KxMsg& in, const QList<QByteArray>& blobs)
     }
     QList<Volume*>& held = obtainVolumes();
     for (std::unique_ptr<Volume>& volume : volumes) {
+        // One for each volume, in their order.
         const VolumeShare& share = shares.at(held.size());
         volume->attachImages(share.index, share.images);
         held.append(volume.release());
@@ -311,6 +319,7 @@ void Volume::serialize(KxMsg& out, QList<QByteArray>& blobs) const
     writeText(record, mVolumeFileName);
     writeSlices(record, slices(), sliceCode(slices(), numImages(), mDims));
     writePreview(record, mPreviewData, blobs);
+    // Last, and without a mark: a reader knows of it by what is left of the record.
     if (hasExtraData())
         serializeExtraData(record);
     TagMap::writeLength(out, record.size());
@@ -319,6 +328,7 @@ void Volume::serialize(KxMsg& out, QList<QByteArray>& blobs) const
 
 bool Volume::deserialize(KxMsg& in, const QList<QByteArray>& blobs, int volumeIndex)
 {
+    // Read aside, so that a damaged record leaves this volume as it was.
     Volume volume(volumeIndex);
     in >> volume.mDims >> volume.mBoundingBox >> volume.mTransformation;
     volume.mVolumeFileName = readText(in);
@@ -350,6 +360,7 @@ void Volume::deserializeExtraData(KxMsg& in)
 {
     quint8 version = 0;
     in >> version;
+    // Of a later form nothing is known; what came before it is a volume all the same.
     if (version != kExtraVersion)
         return;
     quint16 numLossy = 0;

@@ -55,6 +55,7 @@ QHash<const TagMap*, int> countVolumes(const QList<Volume*>& volumes)
 void VolumeSettling::releaseImagesOfOthers(const TagMap& series)
 {
     for (Volume* volume : series.volumes()) {
+        // A copy, for the volume's own list changes when it lets go of an image.
         const QVector<TagMap*> images = volume->images();
         for (int i = 0; i < images.size(); ++i) {
             if (images.at(i)->parent() == &series)
@@ -88,6 +89,7 @@ Result VolumeSettling::settle(TagMap& series)
     }
     if (volumes.isEmpty() || areFoundByReader(series, arrange))
         return {};
+    // Indexes may have come out of order, as when a sync made a volume that was missing.
     std::stable_sort(volumes.begin(), volumes.end(), isBefore);
     nameVolumes(series);
     if (areFoundByReader(series, arrange))

@@ -32,6 +32,7 @@ Result AdoptedCorrections::record()
         if (mResult.good())
             look(*image);
     }
+    // Of corrections that could not all be looked at none is recorded: a part would pass for the whole.
     if (mResult.bad() || mFound.empty())
         return mResult;
     QMap<QByteArray, qint64> requests;
@@ -47,6 +48,9 @@ Result AdoptedCorrections::finish()
     return mRequest != 0 ? mCatalogue->finishRequests({mRequest}) : Result();
 }
 
+/// Looks an image that has a log up in the database, by what it shows and then by what it was. Where the
+/// database tells the same or more there is nothing to do; where the log goes on from there, or the database
+/// knows nothing, the rest is recorded; where the two part, the database counts.
 void AdoptedCorrections::look(const TagMap& image)
 {
     AuditLog log;
@@ -91,6 +95,7 @@ bool AdoptedCorrections::identify(const TagMap& image, const AuditLog& log, Imag
     const QByteArray path = filePathOf(image);
     DcmFileFormat file;
     identity = identityBefore(log, identity, path);
+    // Without the file the log has to tell what the image was.
     if (loadDicomFile(path.constData(), file).bad())
         return true;
     const std::unique_ptr<TagMap> loaded(TagMap::createTagMap(file.getDataset(), kDefaultValueBound));
@@ -131,6 +136,7 @@ bool AdoptedCorrections::isToBeKept(const TagMap& image, const AuditLog& log, co
     if (isListed(identity, path))
         return true;
     if (mResult.good()) {
+        // The file is not listed here, so that its path is only known from the image.
         leaveUndecided(image, "it does not list the image in the study that it was moved from");
         mUndecided.insert(path);
     }
@@ -144,6 +150,7 @@ bool AdoptedCorrections::isListed(const ImageIdentity& identity, const QByteArra
     if (mResult.good())
         mResult = mCatalogue->studyContents(identity.studyUID, contents);
     return std::any_of(contents.images.begin(), contents.images.end(), [&](const Kxg::ListedImage& listed) {
+        // By path or by UID: the study may list another file of the image.
         return listed.path == path ||
                (!listed.sopInstanceUID.isEmpty() && listed.sopInstanceUID == identity.image);
     });

@@ -41,6 +41,7 @@ AuditLog logOf(const Kxg::ImageCorrection& correction)
 Result BuildCorrections::read(int studyId)
 {
     std::vector<std::string> foreign;
+    // What is left of an earlier study would be taken for corrections of this one.
     *this = {};
     const Result result = Kxg::GetCorrections(studyId, mStudyUID, mCorrections, foreign);
     for (const std::string& path : foreign)
@@ -48,6 +49,8 @@ Result BuildCorrections::read(int studyId)
     for (std::size_t i = 0; i < mCorrections.size(); ++i) {
         const Kxg::ImageCorrection& each = mCorrections[i];
         mByImage[each.image].push_back(i);
+        // Images of this study that are shown in another one are asked
+        // for as well, but only these are shown here.
         if (each.shownStudyUID == mStudyUID)
             mByShownImage[each.shownImage].push_back(i);
         for (const QByteArray& uid : formerUIDs(each))
@@ -89,6 +92,7 @@ bool BuildCorrections::apply(const Kxg::ImageCorrection& correction, TagMap& ima
 
 bool BuildCorrections::applyTo(TagMap& image, const QByteArray& path) const
 {
+    // By what the file says, which is how the database knows the image.
     const Kxg::ImageCorrection* known = find(identityOf(image, path));
     return known == nullptr || apply(*known, image);
 }
@@ -100,6 +104,7 @@ bool BuildCorrections::applyToFormer(TagMap& image) const
     // By its log first: what stands under this name may be the image that a correction put in front of another.
     const Kxg::ImageCorrection* known = log.read(image) ? findShown(key, log) : nullptr;
     if (known == nullptr)
+        // One that the tag file does not show corrected yet is known by what its file says.
         known = find({mStudyUID, key});
     return known == nullptr || apply(*known, image);
 }

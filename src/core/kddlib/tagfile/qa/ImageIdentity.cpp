@@ -36,6 +36,7 @@ ImageIdentity identityBefore(const AuditLog& log, const ImageIdentity& now, cons
     if (!log.decode(entries))
         return now;
     const QByteArray image = firstText(entries, DCM_SOPInstanceUID, now.image);
+    // An image that had no UID before the correction was known by its path.
     return {firstText(entries, DCM_StudyInstanceUID, now.studyUID), image.isEmpty() ? path : image};
 }
 

@@ -45,6 +45,7 @@ ImageOverlay& ImageOverlay::operator=(ImageOverlay&&) noexcept = default;
 
 void ImageOverlay::note(const TagMap& image, const DcmTagKey& key)
 {
+    // Without its creator a private value means nothing, and could not be put into another image's block.
     if (isPrivate(key) && !isCreator(key) && image.findElement(creatorOf(key)) != nullptr)
         note(image, creatorOf(key));
     const TagElement* shown = image.findElement(key);
@@ -91,6 +92,7 @@ void ImageOverlay::applyTo(TagMap& image) const
         } else if (isInPlace) {
             image.putElement(key, element.clone());
         } else if (!isCreator(key) && !element.markedAsMissing()) {
+            // Never null: a block that does not fit has a creator on both sides.
             const TagElement* creator = mElements->findElement(creatorOf(key));
             image.putAndInsertValue(key, creator->value().constData(), element.vr(), element.value());
         }
@@ -131,6 +133,7 @@ bool ImageOverlay::decode(const QByteArray& bytes)
     quint8 form = 0;
     in >> form;
     const int length = TagMap::readLength(in);
+    // Bytes behind the record were never written, so they are damage as well.
     if (in.failed() || form != kForm || length != in.remaining())
         return false;
     KxMsg record = in.readMessage(length);

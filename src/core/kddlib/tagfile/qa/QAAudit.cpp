@@ -17,6 +17,7 @@ constexpr int kKeyLength = 9;  // gggg-eeee
 QByteArray line(const QString& text)
 {
     QByteArray bytes = text.toUtf8();
+    // ESC first: it would otherwise take the one that marks a line feed for one of the text.
     bytes.replace("\x1b", "\x1b\x65").replace("\n", "\x1bn");
     return bytes + '\n';
 }
@@ -43,6 +44,7 @@ bool readKey(const QByteArray& line, DcmTagKey& key)
 /// Takes the next line off a text of ended lines; false at its end.
 bool takeLine(const QByteArray& text, int& position, QByteArray& line)
 {
+    // Every line is ended, so one that is not was cut off.
     const int end = text.indexOf('\n', position);
     if (end < 0)
         return false;
@@ -51,6 +53,7 @@ bool takeLine(const QByteArray& text, int& position, QByteArray& line)
     return true;
 }
 
+/// A line of time, three lines for each change, an empty line.
 bool readEntry(const QByteArray& text, int& position, AuditEntry& entry)
 {
     QByteArray line;
@@ -99,6 +102,7 @@ QVector<DcmTagKey> AuditLog::keysIn(const TagMap& image)
     QVector<DcmTagKey> keys;
     const DcmTagKey last(kAuditLog.getGroup(), 0xffff);
     const TagMap::iterator end = image.end();
+    // Below stand the reservations of the blocks.
     for (auto it = image.lowerBound({kAuditLog.getGroup(), 0x1000}); it != end && it.key() <= last; ++it) {
         const quint16 number = it.key().getElement() & 0xff;
         const char* creator = image.privateCreator(it.key());
@@ -116,6 +120,7 @@ bool AuditLog::store(TagMap& image) const
 
 bool AuditLog::decode(QVector<AuditEntry>& entries) const
 {
+    // Aside, so that a damaged log gives nothing rather than half of its entries.
     QVector<AuditEntry> read;
     for (int position = 0; position < mText.size();) {
         AuditEntry entry;

@@ -41,6 +41,7 @@ public:
             }
         }
         requireValue();
+        // For the last Tag; the others are asked when the next one begins.
         return !mXml.hasError();
     }
 
@@ -77,6 +78,7 @@ private:
     void readTimestamp()
     {
         const QString text = mXml.readElementText();
+        // As it stands, for the images keep it so.
         mJob.timestamp = text.toLatin1();
         QString time;
         if (!auditTime(mJob.timestamp, time))
@@ -94,6 +96,7 @@ private:
     void readOldStudy()
     {
         const QByteArray uid = mXml.attributes().value(QLatin1String("OldSUID")).toUtf8();
+        // An OldSUID without text names no study, so it does not speak against another one.
         if (!mJob.oldStudyUID.isEmpty() && !uid.isEmpty() && uid != mJob.oldStudyUID)
             raise(QStringLiteral("OldSUID names a second study, \"%1\"").arg(QString::fromUtf8(uid)));
         if (!uid.isEmpty())
@@ -171,6 +174,7 @@ bool QAData::parseText(const QString& xml, QString& message)
 template <typename Xml>
 bool QAData::take(const Xml& xml, QString& message)
 {
+    // Before the reader sees a byte of it.
     if (xml.size() > kMaxJobXml) {
         message = QStringLiteral("A job of %1 bytes is longer than %2").arg(xml.size()).arg(kMaxJobXml);
         return false;

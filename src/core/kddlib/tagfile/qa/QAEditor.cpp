@@ -24,6 +24,7 @@ namespace Kdd
 namespace
 {
 
+// As DICOM allows [characters].
 constexpr int kLongestUid = 64;
 constexpr quint16 kOurPublicGroup = 0x0006;
 
@@ -133,6 +134,7 @@ QString firstUnwritable(const QString& text, const QByteArray& characterSet)
 {
     QByteArray unused;
     for (int i = 0; i < text.size(); ++i) {
+        // A character beyond 16 bits is two places of the text.
         const int length = text.at(i).isHighSurrogate() ? 2 : 1;
         QString character = text.mid(i, length);
         if (!encodeText(character, characterSet, unused))
@@ -192,6 +194,8 @@ Result check(const QAData& job)
         if (key == DCM_StudyInstanceUID && each.value != QString::fromLatin1(job.studyUID))
             return Result::failure(QStringLiteral("Tag %1 asks for study %2, but the job is one of study %3")
                                        .arg(keyName(key), each.value, QString::fromLatin1(job.studyUID)));
+        // Group 0 belongs to messages and group 2 to the head of
+        // the file; element 0 is the length of a group.
         if (key.getGroup() == kOurPublicGroup || key.getGroup() <= 2 || key.getElement() == 0)
             return Result::failure(QStringLiteral("Tag %1 is no attribute of an image").arg(keyName(key)));
         if (isPrivate(key) && key.getElement() <= 0xff)
@@ -208,6 +212,7 @@ QAEditor::QAEditor(TagMap& image, const QVector<QASubstitution>& job)
     image.findAndGetString(DCM_SpecificCharacterSet, mOldCharacterSet);
     mNewCharacterSet = mOldCharacterSet;
     for (const QASubstitution& each : job) {
+        // All texts of the job go by it, wherever in the job it stands.
         if (each.key == DCM_SpecificCharacterSet)
             mNewCharacterSet = each.value.toLatin1();
     }

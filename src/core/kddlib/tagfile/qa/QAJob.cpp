@@ -83,6 +83,7 @@ Result QAJob::run()
         return result;
     const int readMs = total.elapsed();
     mSourceHasLabels = hasLabels(mSource.tree());
+    // A study that the move makes follows the one that its images come from.
     mDestinationHasLabels = hasLabels(mDestination.tree().isEmpty() ? mSource.tree() : mDestination.tree());
     result = applyToImages();
     const Stopwatch writing;
@@ -103,6 +104,7 @@ Result QAJob::run()
 Result QAJob::prepare()
 {
     mJob.outcome = {};
+    // A move inside one study is an edit: two locks on one file would never be had.
     if (mJob.oldStudyUID == mJob.studyUID)
         mJob.oldStudyUID.clear();
     mIsMove = !mJob.oldStudyUID.isEmpty();
@@ -112,6 +114,7 @@ Result QAJob::prepare()
     auditTime(mJob.timestamp, mTime);
     if (!mJob.login.isEmpty())
         mTime += QLatin1Char(' ') + QString::fromLatin1(mJob.login);
+    // Instance Number decides the order of images in volumes, and UIDs where they belong.
     mReordersImages =
         std::any_of(mJob.substitutions.cbegin(), mJob.substitutions.cend(), [](const QASubstitution& each) {
             return movesImages(each.key) || each.key == DCM_InstanceNumber;
@@ -161,6 +164,7 @@ Result QAJob::hold(StoredStudy& study, const QByteArray& studyUID, IfAbsent ifAb
 
 // ---- writing
 
+/// Brings both trees into the state in which they are written.
 void QAJob::tidy()
 {
     // Volumes first: they may give images to a series that is empty so far.

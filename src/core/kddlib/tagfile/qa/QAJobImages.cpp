@@ -65,10 +65,12 @@ Result QAJob::applyTo(TagMap& image, const QByteArray& key)
     if (!edit.before.read(image))
         return failAt(key, QStringLiteral("its audit log is damaged"));
     if (mReordersImages)
+        // Before the image changes, while volume and image still agree on its place.
         takeVolumes(origin(), *image.parent());
     Result result = substitute(edit);
     if (result.bad())
         return failAt(key, result.text());
+    // All is there already, so the job leaves no entry: running it again changes nothing.
     if (edit.changes.isEmpty())
         return result;
     result = note(edit);
@@ -125,6 +127,7 @@ void QAJob::renewPreview(const Edit& edit)
         return;
     edit.image.deleteElement(kPreview);
     if (edit.image.findElement(kPreview) != nullptr)
+        // The series may hold one for all its images, which this one must not show either.
         edit.image.markAsMissing(kPreview);
 }
 
@@ -142,6 +145,8 @@ QASeriesMove* QAJob::takeVolumes(StudyTree& tree, TagMap& series)
     return &mMoves.emplace(key, QAVolumes::takeOut(tree, series)).first->second;
 }
 
+/// Puts the image where its UIDs now say. An image of the same UID that is there may be the same one, brought
+/// by an earlier run; another one is replaced, unless the job itself has given the UID.
 Result QAJob::move(const Edit& edit)
 {
     const bool staysInSeries =
@@ -159,6 +164,7 @@ Result QAJob::move(const Edit& edit)
         dropFromOrigin(edit);
         return {};
     }
+    // A UID that the job gives is the job's fault; the same image in both studies is not.
     if (edit.hasChanged(DCM_SOPInstanceUID))
         return failAt(edit.key, QStringLiteral("there is another image %1").arg(QString::fromLatin1(newKey)));
     LogFile::warnf("Image %s of study %s replaces the one that study %s had", newKey.constData(),

@@ -59,6 +59,7 @@ Result QARecord::claim(const QAData& job)
 {
     const QByteArray address = Kxg::DatabaseServer();
     if (address.isEmpty())
+        // Without a database the correction lives in the tag files alone.
         return {};
     Result result;
     std::unique_ptr<Kxg::Catalogue> catalogue = Kxg::Catalogue::open(address, result);
@@ -70,10 +71,12 @@ Result QARecord::claim(const QAData& job)
         return TagFileSettings::cacheFilePathForStudy(a.constData()) <
                TagFileSettings::cacheFilePathForStudy(b.constData());
     });
+    // All are looked up before one is claimed: where the database knows none there is nothing to keep.
     QVector<QByteArray> known;
     for (const QByteArray& uid : qAsConst(uids)) {
         QVector<QByteArray> found;
         if (result.good())
+            // One is enough: before all UIDs that it begins comes the UID itself.
             result = catalogue->findStudies(uid, 1, found);
         if (found.contains(uid))
             known.append(uid);
@@ -84,6 +87,10 @@ Result QARecord::claim(const QAData& job)
     if (known.isEmpty())
         return {};
     mCatalogue = std::move(catalogue);
+    if (!job.oldStudyUID.isEmpty()) {
+        mMovedFrom = job.oldStudyUID;
+        mMovedTo = job.studyUID;
+    }
     for (const QByteArray& uid : qAsConst(uids)) {
         const bool isDestination = uid == job.studyUID;
         if (!isDestination && !known.contains(uid))
@@ -134,6 +141,7 @@ Result QARecord::read()
             result = mCatalogue->studyContents(each.first, study.contents);
         if (result.good())
             result = mCatalogue->corrections(each.first, study.corrections);
+        // Asked before the job writes: afterwards the file is another one in any case.
         const Kxg::TagFileStamp& stamp = study.contents.tagFile;
         study.isRecognised = stamp.digest.isEmpty() ||
                              isTagFile(TagFileSettings::cacheFilePathForStudy(each.first.constData()), stamp);
@@ -239,6 +247,7 @@ Result QARecord::record()
             // It came into being after this job had asked for it: now it can be claimed as well.
             if (mStudies.find(change.studyUID) == mStudies.end())
                 return lockedOut(reason);
+            // So that the job can be run when the build is done.
             mCatalogue->requestBuild({change.studyUID}, Kxg::Catalogue::IfGone::PassOver);
             return Result::failure(reason);
         }
@@ -263,6 +272,7 @@ Result QARecord::add(const QAImageChange& change, const Kxg::ImageCorrection& fo
         if (each.key != DCM_PixelData)
             overlay.note(*image, each.key);
     }
+    // And what its log tells of earlier corrections, the log itself included.
     overlay.noteLogged(*image);
     const QByteArray seriesUID = overlay.seriesOf(*image);
     mFormer.push_back(former);
@@ -297,23 +307,29 @@ void QARecord::finish(const StudyTree& tree, const Kxg::TagFileStamp& stamp, con
 {
     const auto found = mStudies.find(studyUID);
     const qint64 request = mRequests.value(studyUID, 0);
-    // A tag file that was not the one that the database knows may lack more than this correction.
-    if (found == mStudies.end() || request == 0 || !found->second.isRecognised)
+    if (found == mStudies.end() || request == 0)
         return;
     Study& study = found->second;
     Result result;
-    if (!tree.isEmpty()) {
-        result = study.claim->finishChange(builtStudy(tree.series(), stamp), request);
+    Kxg::BuiltStudy shown = builtStudy(tree.series(), stamp);
+    shown.movedFrom = mMovedFrom;
+    shown.movedTo = mMovedTo;
+    // A tag file that was not the one that the database knows may lack more than this correction.
+    if (!study.isRecognised) {
+        result = study.claim->noteSearch(shown);
+    } else if (!tree.isEmpty()) {
+        result = study.claim->finishChange(shown, request);
     } else {
         Kxg::StudyContents left;
         result = mCatalogue->studyContents(studyUID, left);
+        // With volume files left the study stays in the database, but has no tag file.
         const bool isGone = left.images.empty() && left.volumes.isEmpty();
         if (result.good() && isGone)
             result = mCatalogue->finishRequests({request});
         if (result.good() && isGone)
             result = study.claim->finishRemoved();
         else if (result.good() && left.images.empty())
-            result = study.claim->finishChange({}, request);
+            result = study.claim->finishChange(shown, request);
     }
     if (result.bad())
         LogFile::warnf("Study %s is built once more: %s", studyUID.constData(),

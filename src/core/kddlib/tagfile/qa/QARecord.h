@@ -88,6 +88,8 @@ private:
     std::vector<Kxg::ImageCorrection> mRecorded;
     std::vector<Kxg::ImageCorrection> mFormer;
     QMap<QByteArray, qint64> mRequests;
+    QByteArray mMovedFrom;  // study UIDs of a job that moves images; else empty
+    QByteArray mMovedTo;
     bool mIsFinal = false;  // taking it back would do more than that
     bool mIsLockedOut = false;
 };

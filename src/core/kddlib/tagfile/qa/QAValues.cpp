@@ -73,6 +73,7 @@ bool isAge(const QByteArray& text)
     return text.size() == 4 && areDigits(text.left(3)) && QByteArray("DWMY").contains(text.at(3));
 }
 
+/// Of 32 bits, as DICOM has it, and no longer than DICOM allows.
 bool isIntegerString(const QByteArray& text)
 {
     bool isNumber = false;

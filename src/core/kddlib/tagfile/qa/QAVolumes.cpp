@@ -62,6 +62,7 @@ QASeriesMove QAVolumes::takeOut(StudyTree& source, TagMap& series)
 
 void QAVolumes::giveBack()
 {
+    // It lost its volumes, so it is numbered anew even if none comes back.
     if (TagMap* series = mMove.source->findSeries(mMove.seriesUID))
         mTouched.append(series);
     for (const QASeriesMove::Stack& stack : mMove.stacks)
@@ -76,6 +77,7 @@ TagMap* QAVolumes::imageNow(const QByteArray& formerKey) const
     if (!mMove.movedTo.contains(formerKey))
         return mMove.source->findImage(formerKey);
     const QByteArray key = mMove.movedTo.value(formerKey);
+    // An image that only changed its own UID is still in the source.
     TagMap* image = mDestination.findImage(key);
     return image != nullptr ? image : mMove.source->findImage(key);
 }
@@ -126,6 +128,7 @@ void QAVolumes::attach(TagMap* series, const Volume& volume, const QVector<TagMa
     for (int i = 0; i < volume.slices().size(); ++i) {
         const Slice former = volume.slices().at(i);
         const int place = places.value(images.value(former.image, nullptr), -1);
+        // A part has only the slices of its own images; a whole volume keeps those of unknown images, too.
         if (place >= 0 || isWhole)
             slices.append({place, former.frame});
     }
@@ -157,6 +160,7 @@ void QAVolumes::obtainPreview(TagMap& series, const QVector<TagMap*>& images)
 {
     const TagMap& middle = *images.at(images.size() / 2);
     const QByteArray path = filePathOf(middle);
+    // A series that shows something already needs no picture of the part.
     if (path.isEmpty() || !series.findPreviewData(nullptr).isEmpty())
         return;
     // Found again by its key: the series may be of the one tree or of the other.

@@ -65,6 +65,7 @@ void QAVolumes::keep(StudyTree& tree, StudyTree& former, const QSet<QByteArray>&
         return image != nullptr && image->findElement(kVolumeIndex) != nullptr;
     };
     for (TagMap* series : former.series()) {
+        // Taken out with the names of the images, by which they are then looked for in the new tree.
         QASeriesMove move = takeOut(former, *series);
         move.source = &tree;
         const TagMap* present = tree.findSeries(move.seriesUID);

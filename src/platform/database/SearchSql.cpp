@@ -1,0 +1,382 @@
+#include "platform/database/SearchSql.h"
+
+#include "platform/database/SqlConnection.h"
+
+#include <algorithm>
+
+namespace Kxg
+{
+namespace
+{
+
+/// The engine's index of parts finds what has at least so many characters.
+constexpr int kIndexedPart = 3;
+
+enum class Where { Study, Words, Series, Request };
+
+struct Column
+{
+    const char* name;  // as it is compared, or sorted by
+    Where where;
+    const char* words;  // its column among the texts that are searched for parts; null: none
+};
+
+Column columnOf(SearchColumn column)
+{
+    switch (column) {
+    case SearchColumn::StudyUID:
+        return {"s.uid", Where::Study, nullptr};
+    case SearchColumn::StudyDate:
+        return {"s.study_date", Where::Study, nullptr};
+    case SearchColumn::StudyTime:
+        return {"s.study_time", Where::Study, nullptr};
+    case SearchColumn::AccessionNumber:
+        return {"s.accession_number", Where::Study, "accession_number"};
+    case SearchColumn::ModalitiesInStudy:
+        return {"m.modality", Where::Study, nullptr};
+    case SearchColumn::ReferringPhysician:
+        return {nullptr, Where::Words, "referring_physician"};
+    case SearchColumn::PatientName:
+        return {"s.sort_name", Where::Words, "patient_name"};
+    case SearchColumn::PatientID:
+        return {"s.patient_id", Where::Study, "patient_id"};
+    case SearchColumn::PatientBirthDate:
+        return {"s.patient_birth_date", Where::Study, nullptr};
+    case SearchColumn::PatientSex:
+        return {"s.patient_sex", Where::Study, nullptr};
+    case SearchColumn::StudyID:
+        return {"s.study_code", Where::Study, "study_code"};
+    case SearchColumn::StudyDescription:
+        return {nullptr, Where::Words, "description"};
+    case SearchColumn::SeriesUID:
+        return {"r.uid", Where::Series, nullptr};
+    case SearchColumn::Modality:
+        return {"r.modality", Where::Series, nullptr};
+    case SearchColumn::SeriesNumber:
+        return {"r.number_text", Where::Series, nullptr};
+    case SearchColumn::SeriesDescription:
+        return {"r.description", Where::Series, nullptr};
+    case SearchColumn::PerformedDate:
+        return {"r.performed_date", Where::Series, nullptr};
+    case SearchColumn::PerformedTime:
+        return {"r.performed_time", Where::Series, nullptr};
+    case SearchColumn::ScheduledStep:
+        return {"q.scheduled_step", Where::Request, nullptr};
+    case SearchColumn::RequestedProcedure:
+        return {"q.requested_procedure", Where::Request, nullptr};
+    case SearchColumn::SOPInstanceUID:
+        return {"f.sop_uid", Where::Series, nullptr};
+    }
+    return {"s.uid", Where::Study, nullptr};
+}
+
+/// The longest piece between two stars.
+QByteArray longestPart(const QByteArray& pattern)
+{
+    QByteArray longest;
+    for (const QByteArray& part : pattern.split('*')) {
+        if (part.size() > longest.size())
+            longest = part;
+    }
+    return longest;
+}
+
+/// Conditions are collected here, and what they are bound to in the same order.
+class Conditions
+{
+public:
+    explicit Conditions(const SqlDialect& dialect)
+        : mDialect(dialect)
+    {
+    }
+
+    void add(const SearchTerm& term)
+    {
+        const Column column = columnOf(term.column);
+        if (term.column == SearchColumn::ModalitiesInStudy)
+            addModalities(term);
+        else if (term.column == SearchColumn::SOPInstanceUID)
+            addImages(term);
+        else if (column.where == Where::Series || column.where == Where::Request)
+            addTo(column.where == Where::Series ? mSeries : mRequest, term, column);
+        else
+            addTo(mStudy, term, column);
+    }
+
+    bool hasSeries() const { return !mSeries.text.isEmpty() || !mRequest.text.isEmpty(); }
+
+    const SearchSql& study() const { return mStudy; }
+
+    /// Of a series that is named `r` outside.
+    SearchSql series() const
+    {
+        SearchSql all = mSeries;
+        if (!mRequest.text.isEmpty()) {
+            all.text += " AND EXISTS (SELECT 1 FROM series_request q WHERE q.study_id = r.study_id AND q.uid = r.uid" +
+                        mRequest.text + ')';
+            all.values += mRequest.values;
+        }
+        return all;
+    }
+
+private:
+    static void append(SearchSql& sql, const QByteArray& condition, const QVariantList& values)
+    {
+        sql.text += " AND " + condition;
+        sql.values += values;
+    }
+
+    void addTo(SearchSql& sql, const SearchTerm& term, const Column& column)
+    {
+        const QByteArray name = column.name;
+        if (!term.values.isEmpty())
+            append(sql, name + " IN (?" + QByteArray(", ?").repeated(term.values.size() - 1) + ')',
+                   texts(term.values));
+        for (const QByteArray& pattern : term.patterns) {
+            if (column.words != nullptr)
+                addWords(sql, column.words, pattern);
+            else
+                append(sql, matches(name), {textValue(mDialect.pattern(pattern))});
+        }
+        if (!term.from.isEmpty() || !term.to.isEmpty())
+            addRange(sql, term, name);
+    }
+
+    QByteArray matches(const QByteArray& column) const { return mDialect.wordsOf.arg(QLatin1String(column)).toLatin1(); }
+
+    void addRange(SearchSql& sql, const SearchTerm& term, const QByteArray& name)
+    {
+        // What has no value is in no range.
+        if (term.from.isEmpty())
+            append(sql, name + " > ''", {});
+        if (!term.fromTime.isEmpty())
+            append(sql, "(s.study_date, s.study_time) >= (?, ?)", texts({term.from, term.fromTime}));
+        if (!term.from.isEmpty())
+            append(sql, name + " >= ?", texts({term.from}));
+        if (!term.toTime.isEmpty())
+            append(sql, "(s.study_date, s.study_time) <= (?, ?)", texts({term.to, term.toTime}));
+        if (!term.to.isEmpty())
+            append(sql, name + " <= ?", texts({term.to}));
+    }
+
+    void addWords(SearchSql& sql, const QByteArray& column, const QByteArray& pattern)
+    {
+        const QByteArray key = mDialect.wordsKey.toLatin1();
+        const QByteArray part = longestPart(pattern);
+        const bool isPart = pattern == '*' + part + '*';
+        const QByteArray list = "s.study_id IN (SELECT " + key + " FROM study_words WHERE ";
+        if (!mDialect.hasMatchIndex || part.size() < kIndexedPart) {
+            append(sql, list + matches(column) + ')', {textValue(mDialect.pattern(pattern))});
+            return;
+        }
+        QByteArray quoted = part;
+        quoted.replace('"', "\"\"");
+        const QVariant phrase = textValue(column + " : \"" + quoted + '"');
+        if (isPart)
+            append(sql, list + "study_words MATCH ?)", {phrase});
+        else
+            append(sql, list + "study_words MATCH ? AND " + matches('+' + column) + ')',
+                   {phrase, textValue(mDialect.pattern(pattern))});
+    }
+
+    void addModalities(const SearchTerm& term)
+    {
+        QByteArray condition;
+        QVariantList values = texts(term.values);
+        if (!term.values.isEmpty())
+            condition += " AND m.modality IN (?" + QByteArray(", ?").repeated(term.values.size() - 1) + ')';
+        for (const QByteArray& pattern : term.patterns) {
+            condition += " AND " + matches("m.modality");
+            values << textValue(mDialect.pattern(pattern));
+        }
+        append(mStudy, "EXISTS (SELECT 1 FROM study_modality m WHERE m.study_id = s.study_id" + condition + ')',
+               values);
+    }
+
+    /// Files that wait to be built in are among them; whoever shows images looks for them in the tag file.
+    void addImages(const SearchTerm& term)
+    {
+        append(mSeries,
+               "(r.study_id, r.uid) IN (SELECT t.study_id, t.uid FROM file f JOIN series t ON t.id = f.series_id"
+               " WHERE f.kind = 1 AND f.sop_uid IN (?" +
+                   QByteArray(", ?").repeated(qMax(1, term.values.size()) - 1) + "))",
+               texts(term.values));
+    }
+
+    static QVariantList texts(const QVector<QByteArray>& values)
+    {
+        QVariantList list;
+        for (const QByteArray& value : values)
+            list << textValue(value);
+        return list;
+    }
+
+    const SqlDialect& mDialect;
+    SearchSql mStudy;
+    SearchSql mSeries;
+    SearchSql mRequest;
+};
+
+const char kStudyColumns[] = "s.study_id, s.uid, s.is_built, s.file_size, s.file_modified, s.digest, s.modalities,"
+                             " s.series_count, s.instance_count";
+
+bool isNewestFirst(const SearchQuery& query)
+{
+    return query.order.empty() || (query.order.size() == 1 && query.order[0].isDescending &&
+                                   query.order[0].column == SearchColumn::StudyDate);
+}
+
+/// Of the table of that name. Ends with the UID, so that pages never overlap.
+QByteArray order(const SearchQuery& query, const QByteArray& table)
+{
+    QByteArray text = " ORDER BY ";
+    const auto by = [&](const char* column, bool isDescending) {
+        text += table + QByteArray(column).mid(1) + (isDescending ? " DESC, " : ", ");
+    };
+    bool hasDate = false;
+    for (const SearchOrder& each : query.order) {
+        const Column column = columnOf(each.column);
+        if (column.name == nullptr || column.name[0] != 's')
+            continue;
+        by(column.name, each.isDescending);
+        if (each.column == SearchColumn::PatientName)
+            by("s.patient_id", each.isDescending);
+        if (each.column == SearchColumn::StudyDate) {
+            by("s.study_time", each.isDescending);
+            hasDate = true;
+        }
+    }
+    if (!hasDate) {
+        by("s.study_date", true);
+        by("s.study_time", true);
+    }
+    return text + table + ".uid";
+}
+
+/// The one modality that is asked for and nothing that narrows the search more.
+const SearchTerm* leadingModality(const SearchQuery& query)
+{
+    const SearchTerm* modality = nullptr;
+    for (const SearchTerm& term : query.terms) {
+        if (term.column == SearchColumn::ModalitiesInStudy && term.values.size() == 1 && term.patterns.isEmpty())
+            modality = &term;
+        else if (term.column != SearchColumn::StudyDate || !term.values.isEmpty())
+            return nullptr;
+    }
+    return isNewestFirst(query) ? modality : nullptr;
+}
+
+/// "FROM ... WHERE ..." of the studies that are found, as `s`.
+SearchSql studiesFrom(const SqlDialect& dialect, const SearchQuery& query, bool isListed)
+{
+    Conditions conditions(dialect);
+    // The list of a modality is kept in its order. Walking it looks at nothing that is not wanted.
+    const SearchTerm* leading = isListed ? leadingModality(query) : nullptr;
+    for (const SearchTerm& term : query.terms) {
+        if (&term != leading)
+            conditions.add(term);
+    }
+    SearchSql sql;
+    if (leading != nullptr) {
+        // Both tables have the columns that are asked of and sorted by.
+        SearchSql dates = conditions.study();
+        dates.text.replace("s.study_", "m.study_");
+        sql.text = " FROM study_modality m JOIN study_search s ON s.study_id = m.study_id WHERE m.modality = ?" +
+                   dates.text;
+        sql.values << textValue(leading->values.front());
+        sql.values += dates.values;
+        return sql;
+    }
+    sql.text = " FROM study_search s WHERE 1 = 1" + conditions.study().text;
+    sql.values = conditions.study().values;
+    if (conditions.hasSeries()) {
+        const SearchSql series = conditions.series();
+        sql.text += " AND s.study_id IN (SELECT r.study_id FROM series_search r WHERE 1 = 1" + series.text + ')';
+        sql.values += series.values;
+    }
+    return sql;
+}
+
+SearchSql seriesFrom(const SqlDialect& dialect, const SearchQuery& query)
+{
+    Conditions conditions(dialect);
+    for (const SearchTerm& term : query.terms)
+        conditions.add(term);
+    const SearchSql series = conditions.series();
+    SearchSql sql;
+    sql.text = " FROM series_search r JOIN study_search s ON s.study_id = r.study_id WHERE 1 = 1" + series.text +
+               conditions.study().text;
+    sql.values = series.values + conditions.study().values;
+    return sql;
+}
+
+void addPage(SearchSql& sql, const SearchQuery& query)
+{
+    sql.text += " LIMIT ? OFFSET ?";
+    sql.values << std::max(0, query.limit) << std::max(0, query.offset);
+}
+
+SearchSql counted(const SearchSql& from, int most)
+{
+    SearchSql sql;
+    sql.text = "SELECT COUNT(*) FROM (SELECT 1" + from.text + " LIMIT ?) counted";
+    sql.values = from.values + QVariantList{most};
+    return sql;
+}
+
+}  // namespace
+
+SearchSql studiesSql(const SqlDialect& dialect, const SearchQuery& query)
+{
+    // The page first, then what it shows: what answers show is large, and would be carried through the sorting.
+    const SearchSql from = studiesFrom(dialect, query, true);
+    const bool isByModality = from.text.startsWith(" FROM study_modality");
+    SearchSql sql;
+    sql.text = QByteArray("SELECT page.*, a.attributes FROM (SELECT ") + kStudyColumns +
+               ", s.study_date, s.study_time, s.sort_name, s.patient_id, s.accession_number,"
+               " s.patient_birth_date, s.patient_sex, s.study_code" +
+               from.text + order(query, isByModality ? "m" : "s");
+    sql.values = from.values;
+    addPage(sql, query);
+    sql.text += ") page JOIN study_answer a ON a.study_id = page.study_id" + order(query, "page");
+    return sql;
+}
+
+SearchSql seriesSql(const SqlDialect& dialect, const SearchQuery& query)
+{
+    SearchSql sql = seriesFrom(dialect, query);
+    sql.text = QByteArray("SELECT page.*, a.attributes, r.instance_count, r.attributes FROM (SELECT ") +
+               kStudyColumns +
+               ", r.uid AS series_uid, s.study_date, s.study_time, s.sort_name, s.patient_id,"
+               " s.accession_number, s.patient_birth_date, s.patient_sex, s.study_code, r.series_number" +
+               sql.text + order(query, "s") + ", r.series_number, r.uid";
+    addPage(sql, query);
+    sql.text += ") page JOIN study_answer a ON a.study_id = page.study_id"
+                " JOIN series_search r ON r.study_id = page.study_id AND r.uid = page.series_uid" +
+                order(query, "page") + ", page.series_number, page.series_uid";
+    return sql;
+}
+
+SearchSql patientsSql(const SqlDialect& dialect, const SearchQuery& query)
+{
+    SearchSql sql = studiesFrom(dialect, query, false);
+    sql.text = "SELECT page.studies, a.attributes FROM (SELECT s.sort_name, s.patient_id, COUNT(*) AS studies,"
+               " MAX(s.study_id) AS study_id" +
+               sql.text + " GROUP BY s.sort_name, s.patient_id ORDER BY s.sort_name, s.patient_id";
+    addPage(sql, query);
+    sql.text += ") page JOIN study_answer a ON a.study_id = page.study_id"
+                " ORDER BY page.sort_name, page.patient_id";
+    return sql;
+}
+
+SearchSql countStudiesSql(const SqlDialect& dialect, const SearchQuery& query, int most)
+{
+    return counted(studiesFrom(dialect, query, true), most);
+}
+
+SearchSql countSeriesSql(const SqlDialect& dialect, const SearchQuery& query, int most)
+{
+    return counted(seriesFrom(dialect, query), most);
+}
+
+}  // namespace Kxg

@@ -1,0 +1,16 @@
+#pragma once
+
+namespace Kxg
+{
+
+class SqlConnection;
+
+/// Makes the table of the texts that are searched for parts, with the engine's index for that. Call within a
+/// transaction; failures throw DatabaseError. A server that has no such index, or does not let us use it, is told of in the
+/// log; searches then read the table through.
+void makeWordsTable(SqlConnection& connection);
+
+/// Makes the index when it is not there and can be had now. Whether it is there.
+bool obtainWordsIndex(SqlConnection& connection);
+
+}  // namespace Kxg

@@ -1,0 +1,190 @@
+#include "platform/database/StudySearch.h"
+
+#include "platform/database/ChangeLog.h"
+#include "platform/database/Schema.h"
+#include "platform/database/SearchRows.h"
+#include "platform/database/SearchSql.h"
+#include "platform/database/SearchWords.h"
+#include "platform/database/SqlConnection.h"
+
+#include <utility>
+
+namespace Kxg
+{
+namespace
+{
+
+using Access = SqlConnection::Access;
+
+constexpr int kStudyColumns = 9;
+constexpr int kSortColumns = 8;  // which the engine gives along
+
+FoundStudy studyOf(const SqlRows& rows, int attributes)
+{
+    FoundStudy study;
+    study.id = static_cast<int>(rows.number(0));
+    study.uid = rows.text(1);
+    study.isBuilt = rows.truth(2);
+    study.tagFile.fileSize = rows.number(3);
+    study.tagFile.modified = rows.number(4);
+    study.tagFile.digest = rows.bytes(5);
+    study.modalities = rows.text(6);
+    study.series = static_cast<int>(rows.number(7));
+    study.instances = static_cast<int>(rows.number(8));
+    study.attributes = rows.bytes(attributes);
+    return study;
+}
+
+}  // namespace
+
+struct StudySearch::Private
+{
+    explicit Private(const DatabaseAddress& address)
+        : connection(address, SqlConnection::IfAbsent::Fail)
+    {
+        requireSchema(connection);
+        bringSchemaUpToDate(connection);
+    }
+
+    const SqlDialect& dialect() const { return SqlDialect::of(connection.address().engine); }
+
+    Kdd::Result transact(Access access, const std::function<void()>& work)
+    {
+        return attempt(connection.address(), [&] { connection.transact(access, work); });
+    }
+
+    /// `take` gets each row of the answer.
+    Kdd::Result ask(const SearchSql& sql, const std::function<void(const SqlRows&)>& take)
+    {
+        return transact(Access::Read, [&] {
+            SqlRows rows = connection.askOnce(sql.text, sql.values);
+            while (rows.next())
+                take(rows);
+        });
+    }
+
+    SqlConnection connection;
+};
+
+std::unique_ptr<StudySearch> StudySearch::open(const QByteArray& address, Kdd::Result& result)
+{
+    std::unique_ptr<StudySearch> search;
+    DatabaseAddress parsed;
+    result = DatabaseAddress::parse(address, parsed);
+    if (result.good())
+        result = attempt(parsed, [&] { search.reset(new StudySearch(std::make_unique<Private>(parsed))); });
+    return search;
+}
+
+StudySearch::StudySearch(std::unique_ptr<Private> made)
+    : d(std::move(made))
+{
+}
+
+StudySearch::~StudySearch() = default;
+
+Kdd::Result StudySearch::studies(const SearchQuery& query, std::vector<FoundStudy>& found)
+{
+    found.clear();
+    return d->ask(studiesSql(d->dialect(), query),
+                  [&](const SqlRows& rows) { found.push_back(studyOf(rows, kStudyColumns + kSortColumns)); });
+}
+
+Kdd::Result StudySearch::series(const SearchQuery& query, std::vector<FoundSeries>& found)
+{
+    found.clear();
+    return d->ask(seriesSql(d->dialect(), query), [&](const SqlRows& rows) {
+        // The series' UID and number stand among those that it is sorted by.
+        const int attributes = kStudyColumns + kSortColumns + 2;
+        found.push_back({studyOf(rows, attributes), rows.text(kStudyColumns),
+                         static_cast<int>(rows.number(attributes + 1)), rows.bytes(attributes + 2)});
+    });
+}
+
+Kdd::Result StudySearch::patients(const SearchQuery& query, std::vector<FoundPatient>& found)
+{
+    found.clear();
+    return d->ask(patientsSql(d->dialect(), query), [&](const SqlRows& rows) {
+        found.push_back({static_cast<int>(rows.number(0)), rows.bytes(1)});
+    });
+}
+
+Kdd::Result StudySearch::countStudies(const SearchQuery& query, int most, int& count)
+{
+    return d->ask(countStudiesSql(d->dialect(), query, most),
+                  [&](const SqlRows& rows) { count = static_cast<int>(rows.number(0)); });
+}
+
+Kdd::Result StudySearch::countSeries(const SearchQuery& query, int most, int& count)
+{
+    return d->ask(countSeriesSql(d->dialect(), query, most),
+                  [&](const SqlRows& rows) { count = static_cast<int>(rows.number(0)); });
+}
+
+Kdd::Result StudySearch::changes(qint64 position, int limit, std::vector<StudyChangeNote>& changes)
+{
+    return d->transact(Access::Read, [&] { changes = changesAfter(d->connection, position, limit); });
+}
+
+Kdd::Result StudySearch::refresh(const FoundStudy& former, const BuiltStudy& present, bool& isDone)
+{
+    isDone = false;
+    return d->transact(Access::Write, [&] {
+        const SearchRowState row = searchRowOf(d->connection, former.id);
+        const bool isAsRead = row.isBuilt == former.isBuilt && row.tagFile.fileSize == former.tagFile.fileSize &&
+                              row.tagFile.modified == former.tagFile.modified;
+        if (!isAsRead || present.search.series.empty())
+            return;
+        putSearchRows(d->connection, former.id, present.search, present.tagFile);
+        isDone = true;
+        // The same content under another time, as after a copy, is nothing new.
+        if (row.isBuilt && row.tagFile.digest == present.tagFile.digest)
+            return;
+        int instances = 0;
+        for (const SeriesSearchRecord& series : present.search.series)
+            instances += series.instances;
+        noteChange(d->connection, {row.isBuilt ? ChangeKind::Corrected : ChangeKind::Arrived, former.uid, {}, {},
+                                   instances});
+    });
+}
+
+Kdd::Result StudySearch::unknownStudies(const QByteArray& after, int limit, QVector<QByteArray>& studyUIDs)
+{
+    studyUIDs.clear();
+    return d->transact(Access::Read, [&] {
+        SqlRows rows = d->connection.ask("SELECT study.uid FROM study JOIN study_search"
+                                         " ON study_search.study_id = study.id WHERE study.uid > ?"
+                                         " AND study_search.is_built = 0 AND study.tag_file_size > 0"
+                                         " ORDER BY study.uid LIMIT ?",
+                                         {textValue(after), limit});
+        while (rows.next())
+            studyUIDs.push_back(rows.text(0));
+    });
+}
+
+Kdd::Result StudySearch::prepare()
+{
+    return d->transact(Access::Write, [&] {
+        obtainWordsIndex(d->connection);
+        QVector<qint64> studies;
+        {
+            SqlRows rows = d->connection.ask("SELECT id FROM study WHERE NOT EXISTS (SELECT 1 FROM study_search"
+                                             " WHERE study_id = study.id)");
+            while (rows.next())
+                studies.push_back(rows.number(0));
+        }
+        for (const qint64 study : qAsConst(studies))
+            putRegisteredRows(d->connection, study);
+    });
+}
+
+Kdd::Result StudySearch::explainStudies(const SearchQuery& query, QByteArray& plan)
+{
+    SearchSql sql = studiesSql(d->dialect(), query);
+    const bool isSqlite = d->connection.address().engine == DatabaseAddress::Engine::Sqlite;
+    sql.text.prepend(isSqlite ? "EXPLAIN QUERY PLAN " : "EXPLAIN (ANALYZE, BUFFERS) ");
+    plan.clear();
+    return d->ask(sql, [&](const SqlRows& rows) { plan += rows.text(isSqlite ? 3 : 0) + '\n'; });
+}
+
+}  // namespace Kxg

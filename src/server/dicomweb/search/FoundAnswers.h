@@ -1,0 +1,46 @@
+#pragma once
+
+#include "server/dicomweb/search/AnswerObject.h"
+#include "server/dicomweb/search/SearchRequest.h"
+
+namespace Kdd
+{
+class TagMap;
+}
+
+namespace Kdd::DicomWeb
+{
+
+/// Makes the objects of an answer: of each level what is always shown, what matched, and the fields asked for.
+class FoundAnswers
+{
+public:
+    /// `root` is the address of the service, as the client has it. Both must outlive the object.
+    FoundAnswers(const SearchRequest& request, const QByteArray& root);
+
+    void add(const Kxg::FoundPatient& patient);
+    void add(const Kxg::FoundStudy& study);
+    void add(const Kxg::FoundSeries& series);
+    void add(const Kxg::FoundSeries& series, const TagMap& image);
+
+    int count() const { return mCount; }
+
+    /// A JSON array.
+    QByteArray json() const { return '[' + mJson + ']'; }
+
+private:
+    void begin(AnswerObject& object, const QByteArray& address) const;
+    void addStudy(AnswerObject& object, const Kxg::FoundStudy& study) const;
+    void addSeries(AnswerObject& object, const Kxg::FoundSeries& series) const;
+    void finish(AnswerObject& object);
+    QByteArray addressOf(const Kxg::FoundStudy& study) const;
+
+    const SearchRequest& mRequest;
+    const QByteArray& mRoot;
+    std::vector<QByteArray> mFields;
+    std::vector<DcmTagKey> mImageKeys;
+    QByteArray mJson;
+    int mCount = 0;
+};
+
+}  // namespace Kdd::DicomWeb

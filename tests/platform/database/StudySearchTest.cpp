@@ -1,0 +1,252 @@
+#include "platform/database/StudySearch.h"
+
+#include "DatabaseFixture.h"
+#include "platform/database/SearchText.h"
+
+using namespace Kxg;
+
+namespace
+{
+
+StudySearchRecord aStudy(const char* name, const char* date, const char* id, std::vector<const char*> modalities)
+{
+    StudySearchRecord study;
+    study.patientName = name;
+    study.date = date;
+    study.time = "100000.000000";
+    study.patientID = id;
+    study.attributes = "00100020{\"vr\":\"LO\"}\n";
+    int number = 0;
+    for (const char* modality : modalities) {
+        SeriesSearchRecord series;
+        series.uid = QByteArray(id) + '.' + QByteArray::number(++number);
+        series.modality = modality;
+        series.number = QByteArray::number(number);
+        series.instances = 10;
+        study.series.push_back(series);
+    }
+    return study;
+}
+
+SearchTerm oneOf(SearchColumn column, QVector<QByteArray> values)
+{
+    SearchTerm term;
+    term.column = column;
+    term.values = std::move(values);
+    return term;
+}
+
+SearchTerm like(SearchColumn column, const char* name)
+{
+    SearchTerm term;
+    term.column = column;
+    term.patterns = (column == SearchColumn::PatientName ? namePatterns(QString::fromUtf8(name))
+                                                         : textPatterns(QString::fromUtf8(name)))
+                        .patterns;
+    return term;
+}
+
+SearchTerm between(SearchColumn column, const char* from, const char* to, const char* fromTime = "",
+                   const char* toTime = "")
+{
+    SearchTerm term;
+    term.column = column;
+    term.from = from;
+    term.to = to;
+    term.fromTime = fromTime;
+    term.toTime = toTime;
+    return term;
+}
+
+class StudySearchTest : public DatabaseTest
+{
+protected:
+    void build(const char* uid, const StudySearchRecord& study, const char* digest = "d")
+    {
+        add({dicom(QByteArray("/d/" + QByteArray(uid)).constData(), uid, QByteArray(uid + QByteArray(".1")), uid)});
+        finish(uid, study, digest);
+    }
+
+    void finish(const char* uid, const StudySearchRecord& study, const char* digest)
+    {
+        std::unique_ptr<StudyClaim> claim;
+        ASSERT_EQ(catalogue().claim(uid, 0, claim, Catalogue::IfAbsent::Fail).text().toStdString(), "");
+        BuiltStudy built;
+        built.tagFile = {5, digest};
+        built.tagFile.modified = 7;
+        built.search = study;
+        ASSERT_EQ(claim->finish(built).text().toStdString(), "");
+    }
+
+    StudySearch& search()
+    {
+        Kdd::Result result;
+        if (!mSearch)
+            mSearch = StudySearch::open(address(), result);
+        EXPECT_EQ(result.text().toStdString(), "");
+        return *mSearch;
+    }
+
+    /// The UIDs that are found, in order.
+    std::string find(std::vector<SearchTerm> terms, std::vector<SearchOrder> order = {}, int limit = 100,
+                     int offset = 0)
+    {
+        SearchQuery query;
+        query.terms = std::move(terms);
+        query.order = std::move(order);
+        query.limit = limit;
+        query.offset = offset;
+        std::vector<FoundStudy> found;
+        EXPECT_EQ(search().studies(query, found).text().toStdString(), "");
+        int count = 0;
+        EXPECT_EQ(search().countStudies(query, 1000, count).text().toStdString(), "");
+        if (offset == 0 && limit == 100) {
+            EXPECT_EQ(count, static_cast<int>(found.size()));
+        }
+        QByteArray uids;
+        for (const FoundStudy& study : found)
+            uids += (uids.isEmpty() ? "" : " ") + study.uid;
+        return uids.toStdString();
+    }
+
+    std::string changes(qint64 after = 0)
+    {
+        std::vector<StudyChangeNote> noted;
+        EXPECT_EQ(search().changes(after, 100, noted).text().toStdString(), "");
+        QByteArray text;
+        for (const StudyChangeNote& each : noted)
+            text += QByteArray::number(each.position) + "ACMD"[static_cast<int>(each.kind) - 1] + each.studyInstanceUID +
+                    ' ';
+        return text.toStdString();
+    }
+
+private:
+    std::unique_ptr<StudySearch> mSearch;
+};
+
+INSTANTIATE_TEST_SUITE_P(Engines, StudySearchTest, testing::Values(Engine::Sqlite, Engine::Postgres), engineName);
+
+TEST_P(StudySearchTest, FindsByEachColumn)
+{
+    build("1", aStudy("Müller^Eva", "20240101", "P1", {"CT", "SR"}));
+    build("2", aStudy("Miller^Adam=山田^太郎", "20240301", "P2", {"MR"}));
+    build("3", aStudy("", "", "", {"CT"}));
+    EXPECT_EQ(find({}), "2 1 3");  // what has no date is there, too
+    EXPECT_EQ(find({like(SearchColumn::PatientName, "*uller*")}), "1");
+    EXPECT_EQ(find({like(SearchColumn::PatientName, "*LER*")}), "2 1");
+    EXPECT_EQ(find({like(SearchColumn::PatientName, "*l*")}), "2 1");
+    EXPECT_EQ(find({like(SearchColumn::PatientName, "*田*")}), "2");
+    EXPECT_EQ(find({like(SearchColumn::PatientName, "^adam")}), "2");
+    EXPECT_EQ(find({like(SearchColumn::PatientID, "p*")}), "2 1");
+    EXPECT_EQ(find({oneOf(SearchColumn::PatientID, {"P1"})}), "1");
+    EXPECT_EQ(find({oneOf(SearchColumn::PatientID, {"p1"})}), "");
+    EXPECT_EQ(find({oneOf(SearchColumn::ModalitiesInStudy, {"CT"})}), "1 3");
+    EXPECT_EQ(find({oneOf(SearchColumn::ModalitiesInStudy, {"MR", "SR"})}), "2 1");
+    EXPECT_EQ(find({oneOf(SearchColumn::ModalitiesInStudy, {"CT"}), between(SearchColumn::StudyDate, "2024", "")}),
+              "1");
+    EXPECT_EQ(find({between(SearchColumn::StudyDate, "20240101", "20240228")}), "1");
+    EXPECT_EQ(find({between(SearchColumn::StudyDate, "", "20240301")}), "2 1");
+    EXPECT_EQ(find({oneOf(SearchColumn::StudyUID, {"3", "1", "9"})}), "1 3");
+    EXPECT_EQ(find({oneOf(SearchColumn::SeriesUID, {"P1.2"}), oneOf(SearchColumn::Modality, {"SR"})}), "1");
+    EXPECT_EQ(find({oneOf(SearchColumn::SeriesUID, {"P1.2"}), oneOf(SearchColumn::Modality, {"CT"})}), "");
+    EXPECT_EQ(find({oneOf(SearchColumn::SeriesNumber, {"2"})}), "1");
+}
+
+TEST_P(StudySearchTest, ARangeOfDatesAndTimesIsOneOfMoments)
+{
+    build("1", aStudy("A", "20240101", "P1", {"CT"}));
+    const auto from = [&](const char* time) {
+        return find({between(SearchColumn::StudyDate, "20240101", "20240102", time, "090000.000000")});
+    };
+    EXPECT_EQ(from("093000.000000"), "1");
+    EXPECT_EQ(from("100001.000000"), "");
+}
+
+TEST_P(StudySearchTest, PagesFollowEachOtherInEveryOrder)
+{
+    for (int i = 0; i < 9; ++i)
+        build(QByteArray::number(i).constData(),
+              aStudy(i % 2 ? "Same^Name" : "", i % 3 ? "20240101" : "", QByteArray::number(i % 4).constData(), {"CT"}));
+    const std::vector<SearchOrder> orders[] = {{},
+                                               {{SearchColumn::PatientName, false}},
+                                               {{SearchColumn::PatientName, true}},
+                                               {{SearchColumn::PatientID, false}, {SearchColumn::StudyDate, false}}};
+    for (const auto& order : orders) {
+        const std::string all = find({}, order);
+        EXPECT_EQ(all.size(), 17u);
+        EXPECT_EQ(find({}, order, 4, 0) + ' ' + find({}, order, 4, 4) + ' ' + find({}, order, 4, 8), all);
+    }
+}
+
+TEST_P(StudySearchTest, WhatIsRegisteredOnlyIsFound)
+{
+    DicomFileRecord file = dicom("/d/a", "1.2", "1.2.1", "x");
+    file.patientName = "Doe^John";
+    file.modality = "US";
+    file.studyTime = "1030";
+    add({file});
+    EXPECT_EQ(find({like(SearchColumn::PatientName, "doe")}), "1.2");
+    EXPECT_EQ(find({oneOf(SearchColumn::SOPInstanceUID, {"x"})}), "1.2");
+    // A correction may bring the images elsewhere before anything is built.
+    correct({{"1.2", "x", "2", "2.1", "x", "changes"}});
+    EXPECT_EQ(find({}), "2");
+    ASSERT_TRUE(catalogue().removeStudy("2").good());
+    EXPECT_EQ(find({}), "");
+}
+
+TEST_P(StudySearchTest, RegisteringMoreLeavesWhatIsBuiltAsItIsShown)
+{
+    build("1", aStudy("Shown", "20240101", "P1", {"CT"}));
+    add({dicom("/d/more", "1", "1.9", "y")});
+    EXPECT_EQ(find({like(SearchColumn::PatientName, "shown")}), "1");
+}
+
+TEST_P(StudySearchTest, ChangesAreTold)
+{
+    build("1", aStudy("A", "20240101", "P1", {"CT"}));
+    build("2", aStudy("A", "20240101", "P2", {"CT"}));
+    finish("1", aStudy("B", "20240101", "P1", {"CT"}), "e");
+    finish("1", aStudy("B", "20240101", "P1", {"CT"}), "e");  // the same bytes once more
+    finish("1", aStudy("B", "20240101", "P1", {"CT", "MR"}), "f");
+    finish("1", aStudy("B", "20240101", "P1", {"MR"}), "g");
+    ASSERT_TRUE(catalogue().removeStudy("2").good());
+    std::unique_ptr<StudyClaim> claim;
+    ASSERT_TRUE(catalogue().claim("2", 0, claim).good());
+    ASSERT_EQ(claim->finishRemoved().text().toStdString(), "");
+    EXPECT_EQ(changes(), "1A1 2A2 3C1 4A1 5D1 6D2 ");
+    EXPECT_EQ(changes(4), "5D1 6D2 ");
+    EXPECT_EQ(find({}), "1");
+}
+
+TEST_P(StudySearchTest, OnlyOneRefreshesWhatSeveralFoundOld)
+{
+    build("1", aStudy("Old", "20240101", "P1", {"CT"}));
+    std::vector<FoundStudy> found;
+    ASSERT_TRUE(search().studies({}, found).good());
+    BuiltStudy present;
+    present.tagFile = {9, "new"};
+    present.tagFile.modified = 9;
+    present.search = aStudy("New", "20240101", "P1", {"CT"});
+    bool isDone = false;
+    ASSERT_TRUE(search().refresh(found.at(0), present, isDone).good());
+    EXPECT_TRUE(isDone);
+    present.search = aStudy("Late", "20240101", "P1", {"CT"});
+    ASSERT_TRUE(search().refresh(found.at(0), present, isDone).good());
+    EXPECT_FALSE(isDone);
+    EXPECT_EQ(find({like(SearchColumn::PatientName, "new")}), "1");
+    EXPECT_EQ(find({like(SearchColumn::PatientName, "old")}), "");
+    EXPECT_EQ(changes(1), "2C1 ");
+}
+
+TEST_P(StudySearchTest, PatientsAreListedOnce)
+{
+    build("1", aStudy("Doe^John", "20240101", "P1", {"CT"}));
+    build("2", aStudy("Doe^John", "20240201", "P1", {"CT"}));
+    build("3", aStudy("Doe^John", "20240201", "P2", {"MR"}));
+    std::vector<FoundPatient> found;
+    ASSERT_EQ(search().patients({}, found).text().toStdString(), "");
+    ASSERT_EQ(found.size(), 2u);
+    EXPECT_EQ(found[0].studies, 2);
+}
+
+}  // namespace
