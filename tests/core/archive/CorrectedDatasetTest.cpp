@@ -36,8 +36,13 @@ QByteArray wholeOf(const CorrectedDataset& dataset, ByteSource& source, const Fr
                                     static_cast<int>(index.pixelValue().length));
     DecodedPixels pixels(source, index);
     QByteArray block;
-    while (dataset.pixels() == Pixels::Decoded && pixels.next(block).good() && !block.isEmpty())
+    while (dataset.pixels() == Pixels::Decoded) {
+        const Result decoded = pixels.next(block);
+        EXPECT_TRUE(decoded.good()) << qPrintable(decoded.text());
+        if (decoded.bad() || block.isEmpty())
+            break;
         bytes += block;
+    }
     return bytes + dataset.tail();
 }
 
@@ -50,12 +55,29 @@ std::string faultsOf(const QByteArray& bytes, const TagMap& image, bool isDecode
     if (read.bad())
         return std::string("cannot be read: ") + read.text();
     verifyDataset(*file.getDataset(), image, [&](const QByteArray& path, const QByteArray& fault) {
-        // What decoding is there to change.
-        const bool isWanted = isDecoded && (path == "(0028,0004)" || path == "(0028,0006)" ||
-                                            path == "(7fe0,0010)" || path == "(7fe0,0001)" || path == "(7fe0,0002)");
+        // What decoding is there to change, and numbers whose sign is told only where their VR has to be written.
+        const bool isPixels = path == "(0028,0004)" || path == "(0028,0006)" || path == "(7fe0,0010)" ||
+                              path == "(7fe0,0001)" || path == "(7fe0,0002)";
+        const bool isWanted = (isDecoded && isPixels) || fault.endsWith("in the tag file xs");
         faults += isWanted ? std::string() : (path + ' ' + fault + '\n').toStdString();
     });
     return faults;
+}
+
+std::string uidInMeta(const QByteArray& bytes)
+{
+    DcmFileFormat file;
+    OFString uid;
+    readDicomBuffer(bytes, file);
+    file.getMetaInfo()->findAndGetOFString(DCM_MediaStorageSOPInstanceUID, uid);
+    return uid;
+}
+
+/// A frame of it is smaller than its image, or is no whole codestream.
+bool isDamaged(const QString& path)
+{
+    return path.endsWith(QLatin1String("multiframe/sc/multiframe.dcm")) ||
+           path.endsWith(QLatin1String("JPEG2000-embedded-sequence-delimiter.dcm"));
 }
 
 struct RealImage
@@ -125,14 +147,14 @@ TEST_F(RealDatasets, ShowWhatTheTagFileShowsInEverySyntax)
             // Without VRs what the dictionary does not know loses its own.
             const bool isLoss = syntax == "1.2.840.10008.1.2" && real.index.transferSyntaxUID() != syntax;
             CorrectedDataset dataset;
-            if (isLoss || (isDecoded && !real.index.canDecode()))
+            if (isLoss || (isDecoded && (!real.index.canDecode() || isDamaged(path))))
                 continue;
             const Result made = dataset.make(real.source, real.index, *real.image, syntax);
             ASSERT_TRUE(made.good()) << qPrintable(path) << qPrintable(made.text());
             EXPECT_FALSE(dataset.isAsInFile());
             const QByteArray whole = wholeOf(dataset, real.source, real.index);
             EXPECT_EQ(faultsOf(whole, *real.image, isDecoded), "") << qPrintable(path) << syntax.constData();
-            EXPECT_TRUE(whole.mid(128, 400).contains("1.2.3.4.5.6.7")) << "in the meta header";
+            EXPECT_EQ(uidInMeta(whole), "1.2.3.4.5.6.7") << qPrintable(path);
             decoded += isDecoded ? 1 : 0;
         }
     }
@@ -145,7 +167,9 @@ protected:
     CorrectedDatasetTest()
     {
         DatasetBuilder item = anItem().with(DCM_CodeMeaning, "wrong").withLong(DCM_TextValue, 5000);
-        mImage.with(DCM_PatientName, "Wrong^Name").withItem(DCM_ContentSequence, item).withLong(DCM_TextValue, 3000);
+        mImage.with(DCM_PatientName, "Wrong^Name")
+            .withItem(DCM_ContentSequence, item)
+            .withLong(DCM_TextValue, 3000);
         write();
     }
 
@@ -158,10 +182,7 @@ protected:
         ASSERT_TRUE(mIndex.read(mSource).good());
     }
 
-    Result make(const TagMap& image)
-    {
-        return mDataset.make(mSource, mIndex, image, "1.2.840.10008.1.2.1");
-    }
+    Result make(const TagMap& image) { return mDataset.make(mSource, mIndex, image, "1.2.840.10008.1.2.1"); }
 
     QTemporaryDir mFolder;
     DatasetBuilder mImage = anImage();
@@ -199,7 +220,8 @@ TEST_F(CorrectedDatasetTest, LeavesOwnAttributesOutAndTheAuditLogIn)
 {
     const Map map(mImage.map());
     AuditLog log;
-    log.append({QStringLiteral("1/1/2024 12:00:00 AM"), {{DCM_PatientName, QStringLiteral("a"), QStringLiteral("b")}}});
+    log.append({QStringLiteral("1/1/2024 12:00:00 AM"),
+                {{DCM_PatientName, QStringLiteral("a"), QStringLiteral("b")}}});
     map->putAndInsertValue(kFilePath, VrCode::LO, "/secret/place");
     log.store(*map);
     ASSERT_TRUE(make(*map).good());
@@ -217,7 +239,8 @@ TEST(ImageOrigin, IsWhatTheFileSaysBeforeAllCorrections)
     map->putAndInsertValue(kFilePath, VrCode::LO, "/place");
     const QString first = QStringLiteral("1.2.7");
     log.append({QStringLiteral("1"), {{DCM_SOPInstanceUID, first, QStringLiteral("1.2.8")}}});
-    log.append({QStringLiteral("2"), {{DCM_SOPInstanceUID, QStringLiteral("1.2.8"), QStringLiteral("1.2.9")}}});
+    log.append(
+        {QStringLiteral("2"), {{DCM_SOPInstanceUID, QStringLiteral("1.2.8"), QStringLiteral("1.2.9")}}});
     log.store(*map);
     ASSERT_TRUE(ImageOrigin::of(*map, origin).good());
     EXPECT_EQ(origin.sopInstanceUID, "1.2.7");

@@ -7,7 +7,9 @@
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/tagmodel/TagSequence.h"
+#include "platform/volume/FragmentReader.h"
 #include "platform/volume/KxCompressedDataMedia.h"
+#include "platform/volume/StoredFrame.h"
 
 #include <QtEndian>
 
@@ -132,9 +134,10 @@ private:
 
     static Result missing(const DcmTagKey& key)
     {
-        return Result::failure(QStringLiteral("The file does not have the value of %1, so it is not the one the "
-                                              "tag file was made from")
-                                   .arg(keyName(key)));
+        return Result::failure(
+            QStringLiteral("The file does not have the value of %1, so it is not the one the "
+                           "tag file was made from")
+                .arg(keyName(key)));
     }
 
     static Result replace(DcmItem& item, const DcmTagKey& key, const TagElement& shown)
@@ -149,7 +152,8 @@ private:
     Result showItems(DcmItem& item, const DcmTagKey& key, const TagElement* held, const TagSequence& shown)
     {
         DcmSequenceOfItems* items = nullptr;
-        const auto* own = held != nullptr && held->isSequence() ? static_cast<const TagSequence*>(held) : nullptr;
+        const auto* own =
+            held != nullptr && held->isSequence() ? static_cast<const TagSequence*>(held) : nullptr;
         const bool isSame = own != nullptr && own->numItems() == shown.numItems() &&
                             item.findAndGetSequence(key, items).good() &&
                             items->card() == static_cast<unsigned long>(own->numItems());
@@ -174,13 +178,58 @@ private:
 /// What decoding makes of the attributes that tell how pixels are stored.
 void describeDecoded(DcmDataset& dataset, const FrameIndex& index)
 {
-    for (const DcmTagKey& key : {DcmTagKey(0x7fe0, 0x0001), DcmTagKey(0x7fe0, 0x0002), DcmTagKey(0x7fe0, 0x0003)})
+    for (const DcmTagKey& key :
+         {DcmTagKey(0x7fe0, 0x0001), DcmTagKey(0x7fe0, 0x0002), DcmTagKey(0x7fe0, 0x0003)})
         dataset.findAndDeleteElement(key);
     const QByteArray photometric = index.decodedPhotometric();
     if (!photometric.isEmpty())
         dataset.putAndInsertString(DCM_PhotometricInterpretation, photometric.constData());
     if (dataset.tagExists(DCM_PlanarConfiguration))
         dataset.putAndInsertUint16(DCM_PlanarConfiguration, 0);
+}
+
+/// Icons are compressed as the image is, and are decoded with it.
+Result decodeIcon(DcmItem& item)
+{
+    DcmElement* element = nullptr;
+    E_TransferSyntax xfer = EXS_Unknown;
+    StoredFrame icon;
+    if (item.findAndGetElement(DCM_PixelData, element).bad() || findFragments(*element, xfer) == nullptr)
+        return {};
+    Result result = readStoredFrame(item, 0, 0, icon);
+    const bool isWide = sizeOf(icon.pixels.type) > 1;
+    QByteArray pixels = icon.pixels.pixels;
+    pixels.append(pixels.size() % 2, '\0');
+    auto native = std::make_unique<DcmPixelData>(DcmTag(DCM_PixelData, isWide ? EVR_OW : EVR_OB));
+    native->putUint8Array(reinterpret_cast<const Uint8*>(pixels.constData()),
+                          static_cast<Uint32>(pixels.size()));
+    if (result.good() && icon.pixels.components == 3) {
+        const bool isRgb = icon.colour == StoredFrame::Colour::Rgb;
+        item.putAndInsertString(DCM_PhotometricInterpretation, isRgb ? "RGB" : "YBR_FULL");
+        item.putAndInsertUint16(DCM_PlanarConfiguration, 0);
+    }
+    if (result.good() && item.insert(native.get(), OFTrue).good())
+        static_cast<void>(native.release());
+    return result.within(QStringLiteral("The icon"));
+}
+
+/// Those in sequences; the image's own pixels are not in the dataset.
+Result decodeIcons(DcmItem& item, int depth)
+{
+    Result result;
+    for (DcmObject* object = item.nextInContainer(nullptr); object != nullptr && result.good();
+         object = item.nextInContainer(object)) {
+        if (object->ident() != EVR_SQ || depth >= kMaxItemDepth)
+            continue;
+        auto& items = static_cast<DcmSequenceOfItems&>(*object);
+        for (DcmObject* next = items.nextInContainer(nullptr); next != nullptr && result.good();
+             next = items.nextInContainer(next)) {
+            result = decodeIcon(static_cast<DcmItem&>(*next));
+            if (result.good())
+                result = decodeIcons(static_cast<DcmItem&>(*next), depth + 1);
+        }
+    }
+    return result;
 }
 
 QByteArray decodedVr(DcmDataset& dataset)
@@ -226,13 +275,28 @@ std::unique_ptr<DcmDataset> takeTail(DcmDataset& dataset)
     return tail;
 }
 
-Result writeMeta(DcmFileFormat& dicom, const QByteArray& syntaxUID, QByteArray& bytes)
+OFCondition putUid(DcmMetaInfo& meta, const DcmTagKey& key, const QByteArray& uid)
+{
+    return uid.isEmpty() ? EC_Normal : meta.putAndInsertString(key, uid.constData());
+}
+
+Result writeMeta(DcmFileFormat& dicom, const TagMap& image, const QByteArray& syntaxUID, QByteArray& bytes)
 {
     DcmMetaInfo& meta = *dicom.getMetaInfo();
-    // What is missing in it comes first; the syntax may be one that DCMTK has no name for.
+    QByteArray sopClass;
+    image.findAndGetString(DCM_SOPClassUID, sopClass);
+    // What is missing in it comes first. DCMTK does not follow the dataset's UIDs in every file, and the syntax may be
+    // one that it has no name for.
     OFCondition condition = dicom.validateMetaInfo(EXS_LittleEndianExplicit, EWM_updateMeta);
     if (condition.good())
-        condition = meta.putAndInsertString(DCM_TransferSyntaxUID, syntaxUID.constData());
+        condition = putUid(meta, DCM_MediaStorageSOPClassUID, sopClass);
+    if (condition.good())
+        condition = putUid(meta, DCM_MediaStorageSOPInstanceUID, image.uid(TagMap::ImageLevel));
+    if (condition.good())
+        condition = putUid(meta, DCM_TransferSyntaxUID, syntaxUID);
+    if (condition.good())
+        condition = meta.computeGroupLengthAndPadding(EGL_recalcGL, EPD_noChange, EXS_LittleEndianExplicit,
+                                                      EET_UndefinedLength);
     return condition.good() ? written(meta, bytes, EXS_LittleEndianExplicit)
                             : Result::failure(QStringLiteral("The meta header cannot be written: ") +
                                               QString::fromLatin1(condition.text()));
@@ -295,11 +359,18 @@ Result CorrectedDataset::make(MediaSource& file, const FrameIndex& index, const 
     }
     if (isDecoded && (made.mPixelLength <= 0 || made.mPixelLength >= 0xffffffff))
         return Result::failure(QStringLiteral("The decoded pixels are too long for one attribute"));
-    if (isDecoded)
+    if (isDecoded) {
         describeDecoded(dataset, index);
+        result = decodeIcons(dataset, 0);
+        if (result.bad())
+            return result;
+    }
     const std::unique_ptr<DcmDataset> tail = takeTail(dataset);
-    const E_TransferSyntax xfer = isExplicit ? EXS_LittleEndianExplicit : EXS_LittleEndianImplicit;
-    result = writeMeta(dicom, syntaxUID, made.mHead);
+    E_TransferSyntax xfer = isExplicit ? EXS_LittleEndianExplicit : EXS_LittleEndianImplicit;
+    // Icons may be compressed as well.
+    if (index.isEncapsulated() && !isDecoded && dataset.getOriginalXfer() != EXS_Unknown)
+        xfer = dataset.getOriginalXfer();
+    result = writeMeta(dicom, image, syntaxUID, made.mHead);
     if (result.good())
         result = written(dataset, made.mHead, xfer, EGL_withoutGL);
     if (result.good() && tail->card() > 0)
@@ -308,7 +379,8 @@ Result CorrectedDataset::make(MediaSource& file, const FrameIndex& index, const 
         return result;
     if (index.hasPixels()) {
         const QByteArray vr = isDecoded ? decodedVr(dataset) : index.pixelVr();
-        made.mHead += pixelHead(index, isExplicit, index.isEncapsulated() && !isDecoded, vr, made.mPixelLength);
+        made.mHead +=
+            pixelHead(index, isExplicit, index.isEncapsulated() && !isDecoded, vr, made.mPixelLength);
     }
     *this = made;
     return {};

@@ -13,7 +13,7 @@ class MediaSource;
 class TagMap;
 
 /// Where an image's DICOM file lies, and what the file says of itself, as the tag file remembers it: not what the image
-/// shows, for that may have been corrected.
+/// shows, for that may have been corrected. A value. Each thread uses a copy of its own.
 struct KDD_EXPORT ImageOrigin
 {
     QByteArray path;  ///< or URL
@@ -34,14 +34,15 @@ struct KDD_EXPORT ImageOrigin
 /// and the pixels from its own DICOM file. Own attributes of group 0006 stay out; the meta header names the image and
 /// the transfer syntax as they are then.
 ///
-/// Made in pieces, so that pixels need not pass through memory: `head`, the pixels, `tail`.
+/// Made in pieces, so that pixels need not pass through memory: `head`, the pixels, `tail`. A value. Each thread uses a
+/// copy of its own.
 class KDD_EXPORT CorrectedDataset
 {
 public:
     /// Where the pixels come from.
     enum class Pixels {
-        None,     ///< there are none
-        Stored,   ///< the bytes of the file's `pixelValue`
+        None,    ///< there are none
+        Stored,  ///< the bytes of the file's `pixelValue`
         Decoded,  ///< each frame as `FrameIndex::readDecoded` gives it, single bits without gaps between frames, and a
                   ///< NUL if the length is odd
     };

@@ -7,6 +7,7 @@
 
 #include <dcmtk/dcmdata/dcdatset.h>
 #include <dcmtk/dcmdata/dcdeftag.h>
+#include <dcmtk/dcmdata/dcvrobow.h>
 
 #include <cstring>
 #include <utility>
@@ -129,8 +130,7 @@ private:
     {
         const bool isShort = !element.isOpen && element.length <= kLongestValue;
         const char* bytes = isShort ? mBytes.at(element.value, static_cast<int>(element.length)) : nullptr;
-        return bytes == nullptr ? QByteArray()
-                                : trimmed(QByteArray(bytes, static_cast<int>(element.length)));
+        return bytes == nullptr ? QByteArray() : trimmed(QByteArray(bytes, static_cast<int>(element.length)));
     }
 
     void noteNumber(const Element& element)
@@ -199,7 +199,9 @@ private:
     {
         if (mFound.element.length == 0)
             return;
-        mAttributes.insertEmptyElement(mFound.pixelKey);
+        // Only which of them is there counts. As what it is by the dictionary DCMTK would refuse it.
+        if (mAttributes.insert(new DcmOtherByteOtherWord(DcmTag(mFound.pixelKey, EVR_OB))).bad())
+            return;
         mFound.layoutFault = readFrameLayout(mAttributes, mFound.layout);
         mFound.frames = isVideoSyntax(mFound.transferSyntaxUID) ? 1 : numberOfFrames(mAttributes);
         if (mFound.isEncapsulated)

@@ -38,11 +38,8 @@ OFCondition orderWords(DcmDataset& dataset)
     return condition;
 }
 
-}  // namespace
-
-Result writeDicomBytes(DcmFileFormat& file, int syntax, QByteArray& bytes)
+Result writeBytes(DcmFileFormat& file, E_TransferSyntax xfer, QByteArray& bytes)
 {
-    const auto xfer = static_cast<E_TransferSyntax>(syntax);
     std::vector<char> block(kBlock);
     DcmOutputBufferStream out(block.data(), kBlock);
     DcmWriteCache cache;
@@ -65,11 +62,14 @@ Result writeDicomBytes(DcmFileFormat& file, int syntax, QByteArray& bytes)
     return {};
 }
 
+}  // namespace
+
 Result readAsRegularFile(const QByteArray& path, QByteArray& bytes)
 {
     FileStatus status;
     if (statusOf(path.constData(), status) && status.size > kMaxBytes)
-        return Result::failure(QStringLiteral("The file is of an unusual form and too large to be converted"));
+        return Result::failure(
+            QStringLiteral("The file is of an unusual form and too large to be converted"));
     DcmFileFormat file;
     OFCondition condition = loadDicomFile(path.constData(), file);
     DcmDataset* dataset = file.getDataset();
@@ -82,7 +82,7 @@ Result readAsRegularFile(const QByteArray& path, QByteArray& bytes)
                                QString::fromLatin1(condition.text()));
     if (!DcmXfer(syntax).isEncapsulated() && syntax != EXS_LittleEndianImplicit)
         syntax = EXS_LittleEndianExplicit;
-    return writeDicomBytes(file, syntax, bytes);
+    return writeBytes(file, syntax, bytes);
 }
 
 }  // namespace Kdd

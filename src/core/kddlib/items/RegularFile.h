@@ -5,8 +5,6 @@
 
 #include <QByteArray>
 
-class DcmFileFormat;
-
 namespace Kdd
 {
 
@@ -15,8 +13,5 @@ namespace Kdd
 ///
 /// Fails when the file cannot be read, and for one that takes more than 512 MiB in either form: all of it is in memory.
 KDD_EXPORT Result readAsRegularFile(const QByteArray& path, QByteArray& bytes);
-
-/// The bytes of a DICOM file of a dataset that has the transfer syntax (by number, as DCMTK has them) already.
-Result writeDicomBytes(DcmFileFormat& file, int syntax, QByteArray& bytes);
 
 }  // namespace Kdd
