@@ -9,9 +9,8 @@
 #include "server/dicomweb/search/ChangeFeed.h"
 #include "server/dicomweb/search/SearchResource.h"
 
-#include <QFile>
-
 #include <kddlib/ExResource.h>
+#include <kddlib/PathName.h>
 #include <kddlib/TagFile.h>
 
 namespace Kdd
@@ -21,8 +20,8 @@ namespace
 
 QString answersFolder()
 {
-    const QByteArray folder = ExResource::answersFolder();
-    return folder.isEmpty() ? QFile::decodeName(TagFile::metaFolder()) + QStringLiteral("/answers") : QFile::decodeName(folder);
+    const QByteArray configured = ExResource::answersFolder();
+    return pathText(configured.isEmpty() ? TagFile::metaFolder() + QByteArray("answers") : configured);
 }
 
 }  // namespace
@@ -34,14 +33,14 @@ std::vector<std::unique_ptr<DicomWeb::Resource>> makeResources(ServedArchive& ar
     std::vector<std::unique_ptr<Resource>> resources;
     // Viewers ask for frames nine times of ten.
     resources.push_back(std::make_unique<FramesResource>(archive.studies, archive.objects));
-    resources.push_back(std::make_unique<MetadataResource>(archive.studies, answersFolder(),
+    resources.push_back(std::make_unique<MetadataResource>(*archive.studies, answersFolder(),
                                                            qint64(ExResource::answersSize()) * 1024 * 1024));
-    resources.push_back(std::make_unique<SearchResource>(archive.database, archive.studies));
+    resources.push_back(std::make_unique<SearchResource>(archive.database, *archive.studies));
     resources.push_back(std::make_unique<ChangeFeed>(archive.database));
     resources.push_back(std::make_unique<InstancesResource>(archive.studies, archive.objects));
     resources.push_back(std::make_unique<BulkDataResource>(archive.studies, archive.objects));
-    resources.push_back(std::make_unique<ThumbnailResource>(archive.studies));
-    resources.push_back(std::make_unique<RenderedResource>(archive.studies));
+    resources.push_back(std::make_unique<ThumbnailResource>(*archive.studies));
+    resources.push_back(std::make_unique<RenderedResource>(*archive.studies));
     return resources;
 }
 

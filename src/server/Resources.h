@@ -16,8 +16,9 @@ namespace Kdd
 /// What the server keeps of the archive between requests.
 struct ServedArchive
 {
-    DicomWeb::StudyShelf studies{64 * 1024 * 1024};
-    DicomWeb::ObjectShelf objects{16 * 1024 * 1024};
+    // A study of 1,000 images takes about 4 MiB, where the frames of an image lie about 300 bytes.
+    std::shared_ptr<DicomWeb::StudyShelf> studies = std::make_shared<DicomWeb::StudyShelf>(qint64(64) << 20);
+    std::shared_ptr<DicomWeb::ObjectShelf> objects = std::make_shared<DicomWeb::ObjectShelf>(32 << 20);
     DicomWeb::ThreadSearch database{Kxg::DatabaseServer()};
 };
 

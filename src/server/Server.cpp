@@ -89,7 +89,7 @@ struct Server::Private
         browser.dicomWeb = prefix.toList().join('/');
         browser.hasViewer = !settings.viewer.isEmpty();
         browser.hasThumbnails = true;
-        router.add({}, std::make_unique<Browser::BrowserService>(archive.studies, browser));
+        router.add({}, std::make_unique<Browser::BrowserService>(*archive.studies, browser));
         if (settings.status)
             status = std::make_unique<Http::HttpServer>(statusSettings(settings), statusGuard, unobserved);
         metrics.addGauge("kdd_http_connections", "Connections that are open.",

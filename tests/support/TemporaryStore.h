@@ -1,5 +1,7 @@
 #pragma once
 
+#include "kddlib/tagfile/TagFile.h"
+
 #include <QString>
 #include <QTemporaryDir>
 
@@ -10,7 +12,10 @@ namespace Kdd
 class TemporaryStore
 {
 public:
-    TemporaryStore();
+    TemporaryStore()
+    {
+        TagFile::setMetaFolder((folder() + QStringLiteral("/meta")).toLocal8Bit().constData());
+    }
 
     QString folder() const { return mFolder.path(); }
     QString filePath(const char* name) const { return mFolder.filePath(QString::fromLatin1(name)); }

@@ -68,6 +68,8 @@ QByteArray componentPattern(const QString& component, const QByteArray& begin, c
 /// Without the stars at its ends; empty when everything matches. `group` is the mark at its beginning.
 QByteArray groupPattern(const QString& query, const QByteArray& group)
 {
+    if (query.isEmpty())
+        return {};
     if (!query.contains(QLatin1Char('^'))) {
         const bool hasWildcard = query.contains(QLatin1Char('*')) || query.contains(QLatin1Char('?'));
         return componentPattern(query, group, hasWildcard ? QByteArray("^") : componentEnd(0));
@@ -143,7 +145,10 @@ QString foldedText(const QString& text)
         if (!isMark && !isControl)
             folded += each;
     }
-    return folded.toCaseFolded().normalized(QString::NormalizationForm_C).trimmed();
+    folded = folded.toCaseFolded();
+    // Qt folds character by character, and this one is two.
+    folded.replace(QChar(0xDF), QLatin1String("ss"));
+    return folded.normalized(QString::NormalizationForm_C).trimmed();
 }
 
 QByteArray searchText(const QString& text)

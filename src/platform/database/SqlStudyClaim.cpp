@@ -102,7 +102,7 @@ public:
 
     Kdd::Result noteSearch(const BuiltStudy& built) override
     {
-        return conclude({}, [&] { keepSearch(built, TagFileStamp()); });
+        return conclude({}, [&] { keepSearch(built); });
     }
 
     Kdd::Result finishRemoved() override
@@ -140,21 +140,13 @@ private:
 
     void keep(const BuiltStudy& built)
     {
-        TagFileStamp before;
-        {
-            SqlRows rows = mConnection.ask("SELECT tag_file_size, tag_file_digest FROM study WHERE id = ?",
-                                           {mStudyId});
-            if (rows.next())
-                before = {rows.number(0), rows.bytes(1)};
-        }
-        keepSearch(built, before);
+        keepSearch(built);
         mConnection.change("UPDATE study SET tag_file_size = ?, tag_file_digest = ? WHERE id = ?",
                            {built.tagFile.size, bytesValue(built.tagFile.digest), mStudyId});
         describe(built.series);
     }
 
-    /// `before` is the tag file that the study had so far.
-    void keepSearch(const BuiltStudy& built, const TagFileStamp& before)
+    void keepSearch(const BuiltStudy& built)
     {
         const SearchRowState row = searchRowOf(mConnection, mStudyId);
         int instances = 0;
@@ -165,8 +157,9 @@ private:
             removeSearchRows(mConnection, mStudyId);
         else
             putSearchRows(mConnection, mStudyId, built.search, built.tagFile);
-        const bool isSame = row.isBuilt && built.movedTo.isEmpty() && before == built.tagFile;
-        if (isSame || (row.isBuilt && built.isOnlyRearranged))
+        // What was shown so far is what the rows were taken from, whatever tag file the study is said to have.
+        const bool isSame = built.movedTo.isEmpty() && row.tagFile.digest == built.tagFile.digest;
+        if (row.isBuilt && (isSame || built.isOnlyRearranged))
             return;
         noteChange(mConnection, {kindOf(built, row, instances), mStudy.uid, built.movedFrom, built.movedTo,
                                  instances});

@@ -156,8 +156,11 @@ void HttpServer::stop()
         return;
     d->isStarted = false;
     d->host.stops = true;
-    d->threads[0]->io.post([this] { d->listener->close(); });
-    d->onSessions([](Session& session) { session.stop(); });
+    // Whoever sees a connection end finds that there are no new ones either.
+    d->threads[0]->io.post([this] {
+        d->listener->close();
+        d->onSessions([](Session& session) { session.stop(); });
+    });
     if (!d->awaitEnd(d->host.settings.stop)) {
         d->onSessions([](Session& session) { session.abort(); });
         // Those that are still being answered end when their handlers do.

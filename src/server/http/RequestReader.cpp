@@ -6,6 +6,8 @@
 #include <boost/beast/http/parser.hpp>
 #include <boost/beast/http/string_body.hpp>
 
+#include <algorithm>
+#include <cstring>
 #include <optional>
 
 namespace Kdd::Http
@@ -46,6 +48,15 @@ int statusOf(const boost::beast::error_code& fault)
     if (fault == http::error::body_limit)
         return 413;
     return fault == http::error::bad_version ? 505 : 400;
+}
+
+/// "host:80", "[::1]": letters that cannot pass for another part of an address that it is put into.
+bool isHost(const QByteArray& text)
+{
+    return std::all_of(text.begin(), text.end(), [](char each) {
+        return (each >= 'a' && each <= 'z') || (each >= 'A' && each <= 'Z') || (each >= '0' && each <= '9') ||
+               (each != '\0' && std::strchr("-._:[]", each) != nullptr);
+    });
 }
 
 }  // namespace
@@ -137,6 +148,8 @@ RequestReader::State RequestReader::finish()
         return refuse(400);
     if (!target.authority.isNull())
         mHost = target.authority;
+    if (!isHost(mHost))
+        return refuse(400);
     mRequest.path = target.path;
     mRequest.query = target.query;
     return State::Whole;

@@ -191,7 +191,6 @@ void Session::prepareRequest()
     mRequest = mReader.take();
     mRequest.peer = mPeer;
     mRequest.id = requestId(mRequest.header("x-request-id"));
-    mStays = mReader.keepsConnection();
     mRequest.base = QByteArray(mTransport->scheme()) + "://" +
                     (mReader.host().isEmpty() ? mHost.settings.address.text() : mReader.host());
 }
@@ -214,7 +213,7 @@ void Session::answerAtOnce(Response response, Afterwards afterwards)
 {
     if (mRequest.id.isEmpty())
         prepareRequest();
-    mStays = mStays && afterwards == Afterwards::Stay;
+    mIsRefused = afterwards == Afterwards::Close;
     ++mHost.inFlight;
     mIsWithWorker = true;
     write(std::move(response));
@@ -239,7 +238,7 @@ void Session::write(Response response)
     ResponseForm form;
     form.isHead = mRequest.method == Method::Head;
     form.isOldVersion = mReader.isOldVersion();
-    form.keepsConnection = mStays && !mHost.stops;
+    form.keepsConnection = mReader.keepsConnection() && !mIsRefused && !mHost.stops;
     form.id = mRequest.id;
     mWriter.emplace(std::move(response), form);
     send();
@@ -286,12 +285,14 @@ void Session::finish()
     const bool keepsConnection = mWriter->keepsConnection();
     report(true);
     mIsRequest = false;
-    if (!keepsConnection)
+    if (mIsRefused) {
         closeSoftly();
-    else if (mHost.stops)
+    } else if (!keepsConnection || mHost.stops) {
+        mTransport->endWriting();
         close();
-    else
+    } else {
         awaitRequest();
+    }
 }
 
 void Session::report(bool isWhole)

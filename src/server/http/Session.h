@@ -88,7 +88,7 @@ private:
     bool mIsRequest = false;   // something of a request has come that is not answered yet
     bool mIsWithWorker = false;
     bool mIsDraining = false;
-    bool mStays = false;  // after the answer, as far as the client is concerned
+    bool mIsRefused = false;  // the client may still send what nobody reads
     qint64 mDrained = 0;
 };
 

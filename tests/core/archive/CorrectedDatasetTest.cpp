@@ -200,7 +200,7 @@ TEST_F(CorrectedDatasetTest, LeavesOwnAttributesOutAndTheAuditLogIn)
     const Map map(mImage.map());
     AuditLog log;
     log.append({QStringLiteral("1/1/2024 12:00:00 AM"), {{DCM_PatientName, QStringLiteral("a"), QStringLiteral("b")}}});
-    map->putAndInsertString(kFilePath, "/secret/place");
+    map->putAndInsertValue(kFilePath, VrCode::LO, "/secret/place");
     log.store(*map);
     ASSERT_TRUE(make(*map).good());
     const QByteArray whole = wholeOf(mDataset, mSource, mIndex);
@@ -214,7 +214,7 @@ TEST(ImageOrigin, IsWhatTheFileSaysBeforeAllCorrections)
     AuditLog log;
     ImageOrigin origin;
     EXPECT_FALSE(ImageOrigin::of(*map, origin).good()) << "no file is known";
-    map->putAndInsertString(kFilePath, "/place");
+    map->putAndInsertValue(kFilePath, VrCode::LO, "/place");
     const QString first = QStringLiteral("1.2.7");
     log.append({QStringLiteral("1"), {{DCM_SOPInstanceUID, first, QStringLiteral("1.2.8")}}});
     log.append({QStringLiteral("2"), {{DCM_SOPInstanceUID, QStringLiteral("1.2.8"), QStringLiteral("1.2.9")}}});

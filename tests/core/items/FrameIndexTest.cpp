@@ -110,8 +110,8 @@ TEST_F(RealFrames, HaveTheFragmentsThatDcmtkFinds)
             const QByteArray expected = fragmentsByDcmtk(*sequence, frame, index.frames());
             QByteArray stored;
             ASSERT_TRUE(index.readStored(source, frame, stored).good()) << qPrintable(path);
-            if (!expected.isNull())
-                EXPECT_EQ(stored, expected) << qPrintable(path) << " frame " << frame, ++compared;
+            EXPECT_TRUE(expected.isNull() || stored == expected) << qPrintable(path) << " frame " << frame;
+            compared += expected.isNull() ? 0 : 1;
         }
     }
     EXPECT_GT(compared, 500);

@@ -36,6 +36,8 @@ TEST(HttpLimits, AreToldToWhoeverGoesBeyondThem)
         {"nonsense\r\n\r\n", 400},
         {"GET / HTTP/1.1\r\n\r\n", 400},
         {start + "Host: elsewhere\r\n\r\n", 400},
+        {"GET / HTTP/1.1\r\nHost: localhost/a\r\n\r\n", 400},
+        {"GET http://a@localhost/ HTTP/1.1\r\nHost: localhost\r\n\r\n", 400},
         {"GET /a/%2e%2e/b HTTP/1.1\r\nHost: localhost\r\n\r\n", 400},
         {start + "Content-Length: 1\r\nTransfer-Encoding: chunked\r\n\r\n", 400},
         {start + "Content-Length: -1\r\n\r\n", 400},
@@ -74,7 +76,7 @@ TEST(HttpLimits, LetABodyOfAGetPassUnread)
 
 TEST(HttpLimits, EndAHeaderThatDoesNotComeInTime)
 {
-    RunningServer server(pathAsText, withPatience(100));
+    RunningServer server(pathAsText, withPatience(1000));
     Client silent(server.address());
     Client slow(server.address());
     slow.send("GET / HTTP/1.1\r\nHost: loc");

@@ -46,7 +46,7 @@ TEST(HttpServer, NamesEachRequest)
     Client client(server.address());
     const QByteArray tail = " 127.0.0.1 http://localhost";
     std::set<QByteArray> ids;
-    for (const QByteArray& given : {"", "a b", "<script>"}) {
+    for (const QByteArray given : {"", "a b", "<script>"}) {
         client.get("/", given.isEmpty() ? QByteArray() : "X-Request-Id: " + given + "\r\n");
         const Reply reply = client.reply();
         const QByteArray id = reply.header("X-Request-Id");
@@ -60,7 +60,8 @@ TEST(HttpServer, NamesEachRequest)
 TEST(HttpServer, AnswersFiveHundredWhereAHandlerThrows)
 {
     LogCapture log;
-    RunningServer server([](const Http::Request&) -> Http::Response { throw std::runtime_error("secret path"); });
+    RunningServer server(
+        [](const Http::Request&) -> Http::Response { throw std::runtime_error("secret path"); });
     Client client(server.address());
     client.get("/");
     const Reply reply = client.reply();
@@ -181,8 +182,9 @@ TEST(ListenAddress, IsReadAndSaysWhoReachesIt)
         EXPECT_EQ(address.text(), each.shown);
         EXPECT_EQ(address.isLoopback(), each.isLoopback) << each.text;
     }
-    for (const char* text : {"", "8042", ":8042", "127.0.0.1", "127.0.0.1:", "127.0.0.1:65536", "127.0.0.1:-1",
-                             "::1:80", "[127.0.0.1]:80", "[::1]", "127.1:80", "host:80", "127.0.0.1 :80"})
+    for (const char* text :
+         {"", "8042", ":8042", "127.0.0.1", "127.0.0.1:", "127.0.0.1:65536", "127.0.0.1:-1", "::1:80",
+          "[127.0.0.1]:80", "[::1]", "127.1:80", "host:80", "127.0.0.1 :80"})
         EXPECT_FALSE(Http::ListenAddress::parse(text, address)) << text;
 }
 

@@ -63,10 +63,9 @@ bool isPixels(const DcmTagKey& key)
     return key == DCM_PixelData || key == DCM_FloatPixelData || key == DCM_DoubleFloatPixelData;
 }
 
-/// Padding says nothing, so what is made has none.
 bool isPassedOver(const DcmTagKey& key)
 {
-    return key.getGroup() == kOwnGroup || isPixels(key) || key == DCM_DataSetTrailingPadding;
+    return key.getGroup() == kOwnGroup || isPixels(key);
 }
 
 bool holdsOmitted(const TagMap& map)
@@ -126,9 +125,8 @@ private:
         if (held != nullptr && held->compare(shown, true, nullptr))
             return {};
         mHasChanged = true;
-        if (held != nullptr && held->isSequence() && shown.isSequence())
-            return showItems(item, key, static_cast<const TagSequence&>(*held),
-                             static_cast<const TagSequence&>(shown));
+        if (shown.isSequence())
+            return showItems(item, key, held, static_cast<const TagSequence&>(shown));
         return replace(item, key, shown);
     }
 
@@ -148,12 +146,13 @@ private:
         return {};
     }
 
-    Result showItems(DcmItem& item, const DcmTagKey& key, const TagSequence& held, const TagSequence& shown)
+    Result showItems(DcmItem& item, const DcmTagKey& key, const TagElement* held, const TagSequence& shown)
     {
         DcmSequenceOfItems* items = nullptr;
-        const bool isSame = held.numItems() == shown.numItems() &&
+        const auto* own = held != nullptr && held->isSequence() ? static_cast<const TagSequence*>(held) : nullptr;
+        const bool isSame = own != nullptr && own->numItems() == shown.numItems() &&
                             item.findAndGetSequence(key, items).good() &&
-                            items->card() == static_cast<unsigned long>(held.numItems());
+                            items->card() == static_cast<unsigned long>(own->numItems());
         if (!isSame) {
             for (int i = 0; i < shown.numItems(); ++i) {
                 if (holdsOmitted(shown.itemToRead(i)))
@@ -165,7 +164,7 @@ private:
         int i = 0;
         for (DcmObject* next = items->nextInContainer(nullptr); next != nullptr && result.good();
              next = items->nextInContainer(next), ++i)
-            result = apply(static_cast<DcmItem&>(*next), held.itemToRead(i), shown.itemToRead(i));
+            result = apply(static_cast<DcmItem&>(*next), own->itemToRead(i), shown.itemToRead(i));
         return result;
     }
 
@@ -284,7 +283,6 @@ Result CorrectedDataset::make(MediaSource& file, const FrameIndex& index, const 
     result = correction.apply(dataset, *held, image);
     if (result.bad())
         return result;
-    dataset.findAndDeleteElement(DCM_DataSetTrailingPadding);
 
     CorrectedDataset made;
     made.mIsAsInFile = isStored && !correction.hasChanged();

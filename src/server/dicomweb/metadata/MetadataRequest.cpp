@@ -4,6 +4,7 @@
 
 #include <QList>
 #include <QCryptographicHash>
+#include <QList>
 
 #include <dcmtk/dcmdata/dctag.h>
 #include <kddlib/BuildInfo.h>

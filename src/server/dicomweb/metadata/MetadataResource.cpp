@@ -3,6 +3,8 @@
 #include "server/dicomweb/metadata/MetadataAnswer.h"
 #include "server/dicomweb/metadata/MetadataText.h"
 
+#include <QList>
+
 namespace Kdd::DicomWeb
 {
 namespace
@@ -23,7 +25,8 @@ QByteArray entityTag(const MetadataRequest& metadata, const QByteArray& version)
 /// Whether the client has what the tag stands for. `any`: "*" counts, which says no more than that there is something.
 bool hasEntity(const Http::Request& request, const QByteArray& tag, bool any)
 {
-    for (const QByteArray& each : request.header("if-none-match").split(',')) {
+    const QList<QByteArray> tags = request.header("if-none-match").split(',');
+    for (const QByteArray& each : tags) {
         const QByteArray held = each.trimmed();
         if (held == tag || held == "W/" + tag || (any && held == "*"))
             return true;

@@ -193,7 +193,7 @@ Http::Response BulkDataResource::answer(const Http::Request& request, const Reso
     if (isValue && !readSteps(path.rest, steps))
         return Http::failure(400, QStringLiteral("Values are named by keys of eight hexadecimal digits, with the "
                                                  "number of an item between those of a sequence and of its attribute"));
-    Verdict verdict = findStudy(mStudies, path, study);
+    Verdict verdict = findStudy(*mStudies, path, study);
     if (verdict.good())
         verdict = listImages(*study, path, images);
     if (verdict.bad())
@@ -205,12 +205,12 @@ Http::Response BulkDataResource::answer(const Http::Request& request, const Reso
         FoundObject object;
         verdict = takeImage(*study, images.first().key, origin, nullptr);
         if (verdict.good())
-            verdict = mObjects.open(origin, object);
+            verdict = mObjects->open(origin, object);
         return verdict.good() ? answerPixels(request, object) : verdict.response();
     }
     if (isValue) {
         BulkValue value;
-        verdict = findBulkValue(*study, images.first(), steps, mObjects, value);
+        verdict = findBulkValue(*study, images.first(), steps, *mObjects, value);
         return verdict.good() ? answerValue(request, value) : verdict.response();
     }
     return answerAll(Http::AcceptHeader::of(request), path, study, images);
@@ -231,7 +231,7 @@ Http::Response BulkDataResource::answerAll(const Http::AcceptHeader& accept, con
         const bool hasValues = !isPixels && takesParts(accept) && !omittedValues(*study, image).isEmpty();
         Verdict verdict = hasValues ? Verdict() : takeImage(*study, image.key, origin, nullptr);
         if (verdict.good() && !hasValues)
-            verdict = mObjects.open(origin, object);
+            verdict = mObjects->open(origin, object);
         if (verdict.good() && !hasValues)
             verdict = choosePart(accept, object, form);
         if (verdict.good())
@@ -242,19 +242,19 @@ Http::Response BulkDataResource::answerAll(const Http::AcceptHeader& accept, con
     if (kept.isEmpty())
         return first.response();
 
-    const auto make = [=](int number, std::vector<Entry>& entries) {
+    const auto make = [=, objects = mObjects](int number, std::vector<Entry>& entries) {
         const ListedImage& image = kept.at(number);
         ImageOrigin origin;
         FoundObject object;
         Verdict verdict = takeImage(*study, image.key, origin, nullptr);
         if (verdict.good())
-            verdict = mObjects.open(origin, object);
+            verdict = objects->open(origin, object);
         if (verdict.bad() || isPixels)
             return verdict.bad() ? verdict : addPixels(accept, object, {}, entries);
         for (const QVector<ElementStep>& steps : omittedValues(*study, image)) {
             BulkValue value;
             verdict = leadToPixels(steps) ? addPixels(accept, object, placeOf(path, image, steps), entries)
-                                          : findBulkValue(*study, image, steps, mObjects, value);
+                                          : findBulkValue(*study, image, steps, *objects, value);
             if (verdict.bad())
                 return verdict;
             if (leadToPixels(steps))

@@ -14,10 +14,9 @@ namespace Kdd::DicomWeb
 class BulkDataResource : public Resource
 {
 public:
-    /// Both must outlive the resource and its answers.
-    BulkDataResource(StudyShelf& studies, ObjectShelf& objects)
-        : mStudies(studies)
-        , mObjects(objects)
+    BulkDataResource(std::shared_ptr<StudyShelf> studies, std::shared_ptr<ObjectShelf> objects)
+        : mStudies(std::move(studies))
+        , mObjects(std::move(objects))
     {
     }
 
@@ -28,8 +27,8 @@ private:
     Http::Response answerAll(const Http::AcceptHeader& accept, const ResourcePath& path,
                              const std::shared_ptr<const ServedStudy>& study, const QVector<ListedImage>& images);
 
-    StudyShelf& mStudies;
-    ObjectShelf& mObjects;
+    std::shared_ptr<StudyShelf> mStudies;
+    std::shared_ptr<ObjectShelf> mObjects;
 };
 
 }  // namespace Kdd::DicomWeb

@@ -65,13 +65,13 @@ Http::Response FramesResource::answer(const Http::Request& request, const Resour
     FoundObject object;
     Verdict verdict = readFrames(path.rest.first(), frames);
     if (verdict.good())
-        verdict = findStudy(mStudies, path, study);
+        verdict = findStudy(*mStudies, path, study);
     if (verdict.good())
         verdict = listImages(*study, path, images);
     if (verdict.good())
         verdict = takeImage(*study, images.first().key, origin, nullptr);
     if (verdict.good())
-        verdict = mObjects.open(origin, object);
+        verdict = mObjects->open(origin, object);
     if (verdict.good())
         verdict = checkFrames(object.index, frames);
     if (verdict.bad())

@@ -11,10 +11,9 @@ namespace Kdd::DicomWeb
 class FramesResource : public Resource
 {
 public:
-    /// Both must outlive the resource.
-    FramesResource(StudyShelf& studies, ObjectShelf& objects)
-        : mStudies(studies)
-        , mObjects(objects)
+    FramesResource(std::shared_ptr<StudyShelf> studies, std::shared_ptr<ObjectShelf> objects)
+        : mStudies(std::move(studies))
+        , mObjects(std::move(objects))
     {
     }
 
@@ -22,8 +21,8 @@ public:
     Http::Response answer(const Http::Request& request, const ResourcePath& path) override;
 
 private:
-    StudyShelf& mStudies;
-    ObjectShelf& mObjects;
+    std::shared_ptr<StudyShelf> mStudies;
+    std::shared_ptr<ObjectShelf> mObjects;
 };
 
 }  // namespace Kdd::DicomWeb

@@ -68,14 +68,15 @@ Http::Response one(const ServedStudy& study, const ListedImage& image, const Ins
 }
 
 Http::Response several(const std::shared_ptr<const ServedStudy>& study, const QVector<ListedImage>& images,
-                       const InstanceForm& form, ObjectShelf& objects, const QByteArray& studyUID)
+                       const InstanceForm& form, const std::shared_ptr<ObjectShelf>& objects,
+                       const QByteArray& studyUID)
 {
     const bool isZip = form.packing == InstanceForm::Packing::Zip;
-    const auto make = [=, &objects](int number, std::vector<Entry>& entries) {
+    const auto make = [=](int number, std::vector<Entry>& entries) {
         const ListedImage& image = images.at(number);
         Entry entry;
         QByteArray syntaxUID;
-        const Verdict made = makeInstance(*study, image, form, objects, entry.body, syntaxUID);
+        const Verdict made = makeInstance(*study, image, form, *objects, entry.body, syntaxUID);
         entry.mediaType = contentType(syntaxUID);
         if (isZip)
             entry.name = nameOf(studyUID, 0) + '/' + nameOf(image.seriesUID, 0) + '/' +
@@ -109,16 +110,16 @@ Http::Response InstancesResource::answer(const Http::Request& request, const Res
     if (!chooseInstanceForm(Http::AcceptHeader::of(request), !path.instance.isEmpty(), form))
         return Http::failure(406, QStringLiteral("Instances can be given as multipart/related of application/dicom, as "
                                                  "application/zip, and one alone as application/dicom"));
-    Verdict verdict = findStudy(mStudies, path, study);
+    Verdict verdict = findStudy(*mStudies, path, study);
     if (verdict.good())
         verdict = listImages(*study, path, images);
     if (verdict.bad())
         return verdict.response();
     if (!path.instance.isEmpty() && form.packing != InstanceForm::Packing::Zip)
-        return one(*study, images.first(), form, mObjects);
+        return one(*study, images.first(), form, *mObjects);
 
     const int all = images.size();
-    verdict = keepGivable(*study, form, mObjects, images);
+    verdict = keepGivable(*study, form, *mObjects, images);
     if (verdict.bad())
         return verdict.response();
     Http::Response response = several(study, images, form, mObjects, path.study);

@@ -12,10 +12,9 @@ namespace Kdd::DicomWeb
 class InstancesResource : public Resource
 {
 public:
-    /// Both must outlive the resource and its answers.
-    InstancesResource(StudyShelf& studies, ObjectShelf& objects)
-        : mStudies(studies)
-        , mObjects(objects)
+    InstancesResource(std::shared_ptr<StudyShelf> studies, std::shared_ptr<ObjectShelf> objects)
+        : mStudies(std::move(studies))
+        , mObjects(std::move(objects))
     {
     }
 
@@ -23,8 +22,8 @@ public:
     Http::Response answer(const Http::Request& request, const ResourcePath& path) override;
 
 private:
-    StudyShelf& mStudies;
-    ObjectShelf& mObjects;
+    std::shared_ptr<StudyShelf> mStudies;
+    std::shared_ptr<ObjectShelf> mObjects;
 };
 
 }  // namespace Kdd::DicomWeb

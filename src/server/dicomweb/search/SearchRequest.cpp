@@ -24,10 +24,11 @@ constexpr int kMaxFields = 1000;
 constexpr int kMaxPath = 8;  // sequences inside each other
 constexpr int kMaxOrders = 4;
 
-// A page of the list has some hundred studies. Of the images of one series a viewer wants all.
+// A page of the list has some hundred studies; of the images of one series a viewer wants all. The whole answer is in
+// memory until it is sent, half a kilobyte for each image.
 constexpr int kDefaultLimit = 1000;
 constexpr int kGreatestLimit = 10000;
-constexpr int kGreatestImageLimit = 100000;
+constexpr int kGreatestImageLimit = 20000;
 constexpr int kGreatestOffset = 100 * 1000 * 1000;
 
 /// Names that are not those of attributes and are somebody else's: the media type, and what intermediaries add.

@@ -22,6 +22,7 @@ constexpr int kMaxTagFiles = 500;
 // Clients only want to know that there is more; to count all of a large archive takes longer than to find the page.
 constexpr int kMaxRemaining = 10000;
 
+constexpr int kRowsAtOnce = 1000;
 constexpr int kSeriesAtOnce = 500;
 
 // A study that is written again and again while it is looked at is answered as it was found last.
@@ -125,22 +126,6 @@ void SearchRun::noteRemaining(int remaining)
     mIsRemainingCut = remaining > kMaxRemaining;
 }
 
-/// Whether what the query finds can be looked through once more.
-Result SearchRun::isBounded(bool& isBounded)
-{
-    const bool isOfStudies = mRequest.level == SearchLevel::Studies || mRequest.level == SearchLevel::Patients;
-    const int most = mPlan.onImages.empty() ? kMaxRows : kMaxTagFiles;
-    int count = 0;
-    Result result = isOfStudies ? mSearch.countStudies(mPlan.query, most + 1, count)
-                                : mSearch.countSeries(mPlan.query, most + 1, count);
-    isBounded = count <= most;
-    if (!isBounded)
-        mTooBroad = QStringLiteral("More than %1 %2 would have to be looked through: narrow the search")
-                        .arg(most)
-                        .arg(isOfStudies ? QStringLiteral("studies") : QStringLiteral("series"));
-    return result;
-}
-
 // ---- looking once more
 
 /// Null when there is nothing to look at.
@@ -166,9 +151,9 @@ bool SearchRun::holdsImage(const QByteArray& studyUID, const QByteArray& seriesU
     });
 }
 
-bool SearchRun::holds(const Kxg::FoundStudy& study)
+bool SearchRun::holds(const Kxg::FoundStudy& study) const
 {
-    return holdAll(mPlan.onStudy, KeptAttributes(study.attributes), mRequest.zone) && holdsImage(study.uid, {});
+    return holdAll(mPlan.onStudy, KeptAttributes(study.attributes), mRequest.zone);
 }
 
 bool SearchRun::holds(const Kxg::FoundSeries& series) const
@@ -179,76 +164,66 @@ bool SearchRun::holds(const Kxg::FoundSeries& series) const
 
 // ---- studies, series, patients
 
-Result SearchRun::runStudies(FoundAnswers& answers)
+/// `find(query, found)` and `count(query, most, number)` ask the database, `holds(found)` looks once more.
+template <typename Found, typename Find, typename Count, typename Holds>
+Result SearchRun::runListed(FoundAnswers& answers, const Find& find, const Count& count, const Holds& holds)
 {
     Kxg::SearchQuery query = mPlan.query;
-    std::vector<Kxg::FoundStudy> found;
+    std::vector<Found> found;
     if (mPlan.isExact()) {
         query.offset = mRequest.offset;
         query.limit = mRequest.limit + 1;
-        Result result = findStudies(query, found);
+        Result result = find(query, found);
         const int shown = std::min(mRequest.limit, static_cast<int>(found.size()));
         for (int i = 0; i < shown; ++i)
             answers.add(found[static_cast<size_t>(i)]);
         if (result.bad() || static_cast<int>(found.size()) == shown)
             return result;
-        int count = 0;
+        int all = 0;
         const int before = mRequest.offset + shown;
-        result = mSearch.countStudies(query, before + kMaxRemaining + 1, count);
-        noteRemaining(count - before);
+        result = count(query, before + kMaxRemaining + 1, all);
+        noteRemaining(all - before);
         return result;
     }
-    bool isLooked = false;
-    Result result = isBounded(isLooked);
-    query.limit = kMaxRows;
-    if (result.good() && isLooked)
-        result = findStudies(query, found);
+    // How many are to be looked at is bounded, and so is what is in memory of them.
+    const int most = mPlan.onImages.empty() ? kMaxRows : kMaxTagFiles;
+    int candidates = 0;
     int matched = 0;
-    for (const Kxg::FoundStudy& study : found) {
-        if (!holds(study))
-            continue;
-        if (matched >= mRequest.offset && answers.count() < mRequest.limit)
-            answers.add(study);
-        ++matched;
+    Result result = count(query, most + 1, candidates);
+    if (candidates > most) {
+        mTooBroad = QStringLiteral("More than %1 studies or series would have to be looked through: narrow the search")
+                        .arg(most);
+        return result;
+    }
+    query.limit = kRowsAtOnce;
+    for (query.offset = 0; result.good() && query.offset < candidates; query.offset += kRowsAtOnce) {
+        result = find(query, found);
+        for (const Found& each : found) {
+            if (!holds(each))
+                continue;
+            if (matched >= mRequest.offset && answers.count() < mRequest.limit)
+                answers.add(each);
+            ++matched;
+        }
     }
     noteRemaining(matched - mRequest.offset - answers.count());
     return result;
 }
 
+Result SearchRun::runStudies(FoundAnswers& answers)
+{
+    return runListed<Kxg::FoundStudy>(
+        answers, [this](const auto& query, auto& found) { return findStudies(query, found); },
+        [this](const auto& query, int most, int& number) { return mSearch.countStudies(query, most, number); },
+        [this](const Kxg::FoundStudy& study) { return holds(study) && holdsImage(study.uid, {}); });
+}
+
 Result SearchRun::runSeries(FoundAnswers& answers)
 {
-    Kxg::SearchQuery query = mPlan.query;
-    std::vector<Kxg::FoundSeries> found;
-    if (mPlan.isExact()) {
-        query.offset = mRequest.offset;
-        query.limit = mRequest.limit + 1;
-        Result result = findSeries(query, found);
-        const int shown = std::min(mRequest.limit, static_cast<int>(found.size()));
-        for (int i = 0; i < shown; ++i)
-            answers.add(found[static_cast<size_t>(i)]);
-        if (result.bad() || static_cast<int>(found.size()) == shown)
-            return result;
-        int count = 0;
-        const int before = mRequest.offset + shown;
-        result = mSearch.countSeries(query, before + kMaxRemaining + 1, count);
-        noteRemaining(count - before);
-        return result;
-    }
-    bool isLooked = false;
-    Result result = isBounded(isLooked);
-    query.limit = kMaxRows;
-    if (result.good() && isLooked)
-        result = findSeries(query, found);
-    int matched = 0;
-    for (const Kxg::FoundSeries& series : found) {
-        if (!holds(series) || !holdsImage(series.study.uid, series.uid))
-            continue;
-        if (matched >= mRequest.offset && answers.count() < mRequest.limit)
-            answers.add(series);
-        ++matched;
-    }
-    noteRemaining(matched - mRequest.offset - answers.count());
-    return result;
+    return runListed<Kxg::FoundSeries>(
+        answers, [this](const auto& query, auto& found) { return findSeries(query, found); },
+        [this](const auto& query, int most, int& number) { return mSearch.countSeries(query, most, number); },
+        [this](const Kxg::FoundSeries& series) { return holds(series) && holdsImage(series.study.uid, series.uid); });
 }
 
 Result SearchRun::runPatients(FoundAnswers& answers)
@@ -316,15 +291,19 @@ bool SearchRun::takeImages(const std::vector<Kxg::FoundSeries>& page, int& skipp
 
 Result SearchRun::runImages(FoundAnswers& answers)
 {
-    bool isLooked = true;
-    Result result;
-    if (!mPlan.isExact())
-        result = isBounded(isLooked);
+    const bool opensAll = !mPlan.onImages.empty();
+    int candidates = 0;
+    Result result = opensAll ? mSearch.countSeries(mPlan.query, kMaxTagFiles + 1, candidates) : Result();
+    if (candidates > kMaxTagFiles) {
+        mTooBroad = QStringLiteral("The images of more than %1 series would have to be looked through: narrow the search")
+                        .arg(kMaxTagFiles);
+        return result;
+    }
     int skipped = mRequest.offset;
     Kxg::SearchQuery query = mPlan.query;
     query.limit = kSeriesAtOnce;
     std::vector<Kxg::FoundSeries> page;
-    bool isMore = isLooked;
+    bool isMore = true;
     while (result.good() && isMore) {
         result = findSeries(query, page);
         isMore = result.good() && takeImages(page, skipped, answers) &&

@@ -34,6 +34,8 @@ public:
     bool isRemainingCut() const { return mIsRemainingCut; }
 
 private:
+    template <typename Found, typename Find, typename Count, typename Holds>
+    Result runListed(FoundAnswers& answers, const Find& find, const Count& count, const Holds& holds);
     Result runStudies(FoundAnswers& answers);
     Result runSeries(FoundAnswers& answers);
     Result runPatients(FoundAnswers& answers);
@@ -41,9 +43,8 @@ private:
 
     Result findStudies(const Kxg::SearchQuery& query, std::vector<Kxg::FoundStudy>& found);
     Result findSeries(const Kxg::SearchQuery& query, std::vector<Kxg::FoundSeries>& found);
-    Result isBounded(bool& isBounded);
 
-    bool holds(const Kxg::FoundStudy& study);
+    bool holds(const Kxg::FoundStudy& study) const;
     bool holds(const Kxg::FoundSeries& series) const;
     bool holdsImage(const QByteArray& studyUID, const QByteArray& seriesUID);
     std::shared_ptr<const ServedStudy> obtain(const QByteArray& studyUID);

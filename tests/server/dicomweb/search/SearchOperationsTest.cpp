@@ -1,0 +1,171 @@
+#include "SearchedArchive.h"
+
+#include <QFile>
+
+using namespace Kdd;
+using namespace Kdd::DicomWeb;
+
+namespace
+{
+
+constexpr const char* kName = "Group='0010' Element='0010'";
+
+/// What operations do to a study shows at once in searches and in the feed of changes.
+class SearchOperations : public SearchedArchive
+{
+protected:
+    void SetUp() override
+    {
+        SearchedArchive::SetUp();
+        storeImage("1.1", "1", "Doe^John");
+        storeImage("1.2", "1", "Doe^John");
+        storeImage("2.1", "2", "Roe^Jane");
+        add();
+    }
+
+    void storeImage(const char* sop, const char* study, const char* name) const
+    {
+        const QByteArray series = study + QByteArray(".9");
+        store(sop, anImage(sop).inStudy(study).inSeries(series.constData()).with(DCM_PatientName, name).with(DCM_Modality, "CT"));
+    }
+
+    /// UID, name and number of images of each study.
+    std::string shown()
+    {
+        std::string text;
+        for (const QJsonValue& each : list("studies?orderby=StudyInstanceUID"))
+            text += (textOf(each.toObject(), "0020000D") + QLatin1Char(' ') + textOf(each.toObject(), "00100010") +
+                     QLatin1Char(' ') + textOf(each.toObject(), "00201208") + QLatin1String("; "))
+                        .toStdString();
+        return text;
+    }
+
+    /// What was told since the last question.
+    std::string told()
+    {
+        const QByteArray target = "changefeed?after=" + QByteArray::number(mLast);
+        const QJsonObject feed = QJsonDocument::fromJson(bodyOf(get(target.constData()))).object();
+        mLast = feed.value(QLatin1String("last")).toInt();
+        QStringList changes;
+        for (const QJsonValue& each : feed.value(QLatin1String("changes")).toArray())
+            changes << each.toObject().value(QLatin1String("change")).toString() + QLatin1Char(' ') +
+                           each.toObject().value(QLatin1String("study")).toString();
+        return changes.join(QLatin1String(", ")).toStdString();
+    }
+
+    /// Gives an attribute of an image a new value; with `oldStudy` the image comes from there.
+    void correct(const char* study, const char* image, const char* oldStudy, const char* key, const char* value)
+    {
+        QFile job(path("job.xml"));
+        ASSERT_TRUE(job.open(QIODevice::WriteOnly));
+        job.write("<Job><Timestamp>20240131120000</Timestamp><Substitutions OldSUID='" + QByteArray(oldStudy) +
+                  "'><Tag " + key + "><Value>" + value + "</Value></Tag></Substitutions></Job>");
+        job.close();
+        kdd({QStringLiteral("qa"), path("job.xml"), QStringLiteral("--study"), QString::fromLatin1(study),
+             QStringLiteral("--image"), QString::fromLatin1(image)});
+    }
+
+    QString tagFile(const char* study) const { return TagFile::cacheFilePathForStudy(study); }
+
+    int mLast = 0;
+};
+
+INSTANTIATE_TEST_SUITE_P(Engines, SearchOperations, testing::Values(Engine::Sqlite, Engine::Postgres), engineName);
+
+TEST_P(SearchOperations, ArrivalsAndRemovals)
+{
+    EXPECT_EQ(shown(), "1 Doe^John 2; 2 Roe^Jane 1; ");
+    EXPECT_EQ(told(), "arrived 1, arrived 2");
+    storeImage("1.3", "1", "Doe^John");
+    add();
+    EXPECT_EQ(shown(), "1 Doe^John 3; 2 Roe^Jane 1; ");
+    EXPECT_EQ(told(), "arrived 1");
+    kdd("build --settle");
+    EXPECT_EQ(told(), "");  // only the order of the tag file has changed
+    kdd("delete 1 --image 1.3");
+    EXPECT_EQ(shown(), "1 Doe^John 2; 2 Roe^Jane 1; ");
+    EXPECT_EQ(told(), "deleted 1");
+    kdd("delete 2");
+    EXPECT_EQ(shown(), "1 Doe^John 2; ");
+    EXPECT_EQ(told(), "deleted 2");
+    kdd("build --all --again");
+    EXPECT_EQ(shown(), "1 Doe^John 2; ");
+}
+
+TEST_P(SearchOperations, WhatIsRegisteredOnlyAndWhatComesOfIt)
+{
+    told();
+    storeImage("3.1", "3", "New^One");
+    kdd({QStringLiteral("index"), path("images")});
+    EXPECT_EQ(shown(), "1 Doe^John 2; 2 Roe^Jane 1; 3 New^One 1; ");
+    EXPECT_EQ(told(), "");
+    EXPECT_EQ(list("studies/3/instances").size(), 0);
+    kdd("build");
+    EXPECT_EQ(told(), "arrived 3");
+    EXPECT_EQ(list("studies/3/instances").size(), 1);
+}
+
+TEST_P(SearchOperations, CorrectionsAndMoves)
+{
+    told();
+    correct("1", "1.1", "", kName, "Poe^P");
+    EXPECT_EQ(shown(), "1 Poe^P 2; 2 Roe^Jane 1; ");  // the study shows what its first image says
+    EXPECT_EQ(studies("PatientName=poe"), "1");
+    EXPECT_EQ(studies("PatientName=doe"), "");
+    EXPECT_EQ(told(), "corrected 1");
+    correct("2", "1.1", "1", kName, "Roe^Jane");
+    EXPECT_EQ(shown(), "1 Doe^John 1; 2 Roe^Jane 2; ");
+    EXPECT_EQ(told(), "moved 2, moved 1");
+    EXPECT_EQ(list("instances?SOPInstanceUID=1.1").size(), 1);
+    EXPECT_EQ(values("instances?SOPInstanceUID=1.1", "0020000D"), "2");
+    correct("9", "1.2", "1", kName, "Doe^John");
+    EXPECT_EQ(shown(), "2 Roe^Jane 2; 9 Doe^John 1; ");
+    EXPECT_EQ(told(), "moved 9, deleted 1");
+    kdd("build --all --again");
+    EXPECT_EQ(shown(), "2 Roe^Jane 2; 9 Doe^John 1; ");
+}
+
+TEST_P(SearchOperations, ACorrectionOfAnOldTagFileShowsAtOnce)
+{
+    const QString kept = path("kept");
+    ASSERT_TRUE(QFile::copy(tagFile("1"), kept));
+    storeImage("1.3", "1", "Doe^John");
+    add();
+    ASSERT_TRUE(QFile::remove(tagFile("1")) && QFile::copy(kept, tagFile("1")));
+    correct("1", "1.1", "", kName, "Poe^P");
+    EXPECT_EQ(studies("PatientName=poe"), "1");
+    kdd("build");
+    EXPECT_EQ(shown(), "1 Poe^P 3; 2 Roe^Jane 1; ");
+}
+
+TEST_P(SearchOperations, ATagFileOfAnotherTimeIsShownAsItIs)
+{
+    const QString kept = path("kept");
+    ASSERT_TRUE(QFile::copy(tagFile("1"), kept));
+    storeImage("1.3", "1", "Doe^John");
+    add();
+    EXPECT_EQ(shown(), "1 Doe^John 3; 2 Roe^Jane 1; ");
+    told();
+    ASSERT_TRUE(QFile::remove(tagFile("1")) && QFile::copy(kept, tagFile("1")));
+    EXPECT_EQ(shown(), "1 Doe^John 2; 2 Roe^Jane 1; ");
+    EXPECT_EQ(told(), "corrected 1");
+    EXPECT_EQ(list("studies/1/instances").size(), 2);
+    kdd("build --all");
+    EXPECT_EQ(shown(), "1 Doe^John 3; 2 Roe^Jane 1; ");
+    EXPECT_EQ(told(), "arrived 1");
+    // Without the file there is what was known of it.
+    ASSERT_TRUE(QFile::remove(tagFile("1")));
+    EXPECT_EQ(shown(), "1 Doe^John 3; 2 Roe^Jane 1; ");
+    kdd("build --all");
+    EXPECT_EQ(shown(), "1 Doe^John 3; 2 Roe^Jane 1; ");
+}
+
+TEST_P(SearchOperations, AnArchiveFromBeforeSearchesIsFilledOnce)
+{
+    kdd("sync 1");
+    EXPECT_EQ(shown(), "1 Doe^John 2; 2 Roe^Jane 1; ");
+    kdd("build --search");
+    EXPECT_EQ(shown(), "1 Doe^John 2; 2 Roe^Jane 1; ");
+}
+
+}  // namespace

@@ -1,0 +1,106 @@
+#include "server/dicomweb/search/SearchPlan.h"
+
+#include <gtest/gtest.h>
+
+using namespace Kdd;
+using namespace Kdd::DicomWeb;
+
+namespace
+{
+
+QVector<Http::Field> fields(const char* query)
+{
+    QVector<Http::Field> list;
+    for (const QByteArray& field : QByteArray(query).split('&')) {
+        const int equals = field.indexOf('=');
+        list.append({field.left(equals), field.mid(equals + 1)});
+    }
+    return list;
+}
+
+/// Empty when it is understood.
+std::string refusal(const char* query)
+{
+    SearchRequest request;
+    SearchPlan plan;
+    QString reason;
+    const bool isGood = SearchRequest::parse(fields(query), request, reason) && SearchPlan::make(request, plan, reason);
+    EXPECT_EQ(isGood, reason.isEmpty()) << query;
+    return reason.toStdString();
+}
+
+const char* const kUnderstood[] = {
+    "PatientName=a",
+    "00100010=a",
+    "0010001f=a",
+    "RequestAttributesSequence.ScheduledProcedureStepID=1",
+    "00400275.00400009=1",
+    "includefield=00081030,PatientName&includefield=all",
+    "includefield=00081030,",
+    "limit=0&offset=99999999999999",
+    "fuzzymatching=true&emptyvaluematching=false",
+    "StudyDate=20240101-&StudyTime=-1030",
+    "orderby=PatientName,-StudyDate",
+    "timezone=+0100",
+    "TimezoneOffsetFromUTC=-0330",
+    "PatientName=",
+    "accept=application/dicom+json&_=17",
+    "StudyInstanceUID=1.2&StudyInstanceUID=1.3",
+};
+
+const char* const kRefused[] = {
+    "PatientNmae=a",          "limit=-1",         "limit=ten",           "offset=1.5",
+    "fuzzymatching=yes",      "includefield=nix", "orderby=StudyFoo",    "orderby=Rows",
+    "timezone=0100",          "timezone=+01:00",  "StudyDate=yesterday", "StudyDate=20240101-2024",
+    "StudyDate=-",            "StudyTime=1",      "RequestAttributesSequence=1",
+    "A.B.C.D.E.F.G.H.I=1",    "=1",               ".PatientName=1",
+};
+
+TEST(SearchRequest, IsUnderstoodOrRefusedWithAReason)
+{
+    for (const char* query : kUnderstood)
+        EXPECT_EQ(refusal(query), "") << query;
+    for (const char* query : kRefused)
+        EXPECT_NE(refusal(query), "") << query;
+}
+
+TEST(SearchRequest, IsBounded)
+{
+    EXPECT_NE(refusal(("PatientName=" + QByteArray(100000, 'x')).constData()), "");
+    EXPECT_NE(refusal(("StudyInstanceUID=" + QByteArray("1.2.3,").repeated(1) +
+                       [] {
+                           QByteArray uids;
+                           for (int i = 0; i < 3000; ++i)
+                               uids += QByteArray::number(i) + ',';
+                           return uids;
+                       }())
+                          .constData()),
+              "");
+    EXPECT_NE(refusal(QByteArray("PatientName=a&").repeated(100).append("PatientID=1").constData()), "");
+    EXPECT_NE(refusal(("includefield=" + QByteArray("00081030,").repeated(2000)).constData()), "");
+    EXPECT_NE(refusal(("orderby=" + QByteArray("PatientID,").repeated(20) + "PatientID").constData()), "");
+}
+
+TEST(SearchRequest, ListsAreSeparatedByCommaOrBackslash)
+{
+    SearchRequest request;
+    QString reason;
+    ASSERT_TRUE(SearchRequest::parse(fields("StudyInstanceUID=1.2,1.3\\1.2&ModalitiesInStudy=CT,MR&PatientID=A\\B"),
+                                     request, reason));
+    EXPECT_EQ(request.conditions[0].list, (QVector<QString>{QStringLiteral("1.2"), QStringLiteral("1.3")}));
+    EXPECT_EQ(request.conditions[1].list.size(), 2);
+    EXPECT_EQ(request.conditions[2].list.size(), 1);
+    ASSERT_TRUE(SearchRequest::parse(fields("PatientID=A\\B&multiplevaluematching=true"), request, reason));
+    EXPECT_EQ(request.conditions.back().list.size(), 2);
+}
+
+TEST(SearchRequest, OffsetsFromUtcAreMinutes)
+{
+    EXPECT_EQ(zoneMinutes("+0130"), 90);
+    EXPECT_EQ(zoneMinutes(" 0130"), 90);  // as a "+" arrives that was not encoded
+    EXPECT_EQ(zoneMinutes("-0330"), -210);
+    for (const char* wrong : {"", "0100", "+01", "+1500", "+0160", "+-100", "+01000"})
+        EXPECT_FALSE(zoneMinutes(wrong)) << wrong;
+}
+
+}  // namespace

@@ -1,0 +1,132 @@
+#pragma once
+
+#include "server/dicomweb/search/ChangeFeed.h"
+#include "server/dicomweb/search/SearchResource.h"
+#include "support/DatasetBuilder.h"
+#include "support/PostgresServer.h"
+
+#include <QDir>
+#include <QJsonArray>
+#include <QJsonDocument>
+#include <QJsonObject>
+#include <QProcess>
+#include <QTemporaryDir>
+#include <QUrl>
+
+#include <gtest/gtest.h>
+#include <kddlib/Kxg.h>
+#include <kddlib/TagFile.h>
+
+namespace Kdd::DicomWeb
+{
+
+enum class Engine { Sqlite, Postgres };
+
+inline std::string engineName(const testing::TestParamInfo<Engine>& engine)
+{
+    return engine.param == Engine::Sqlite ? "Sqlite" : "Postgres";
+}
+
+/// An archive that the tool makes and changes, and searches over it.
+class SearchedArchive : public testing::TestWithParam<Engine>
+{
+protected:
+    void SetUp() override
+    {
+        mAddress = GetParam() == Engine::Sqlite ? "sqlite:" + path("kdd.sqlite").toUtf8() : newPostgresDatabase();
+        mDatabase = std::make_unique<ThreadSearch>(mAddress);
+        TagFile::setMetaFolder(path("store/meta").toLocal8Bit().constData());
+        QDir().mkpath(path("images"));
+    }
+
+    QString path(const char* name) const { return mFolder.filePath(QString::fromLatin1(name)); }
+
+    /// Writes an image; images of one study are told apart by their file names.
+    void store(const char* name, const DatasetBuilder& image) const
+    {
+        DcmFileFormat file(const_cast<DcmDataset*>(&image.build()));
+        const QByteArray target = path("images").toLocal8Bit() + '/' + name;
+        ASSERT_TRUE(file.saveFile(target.constData(), EXS_LittleEndianExplicit).good());
+    }
+
+    /// Runs the tool, which has to succeed.
+    void kdd(const QStringList& arguments) const
+    {
+        QProcess process;
+        process.start(QStringLiteral(KDD_BINARY),
+                      QStringList{QStringLiteral("--store"), path("store"), QStringLiteral("--database"),
+                                  QString::fromUtf8(mAddress), QStringLiteral("--quiet")} +
+                          arguments);
+        ASSERT_TRUE(process.waitForFinished(120000));
+        ASSERT_EQ(process.exitCode(), 0) << process.readAllStandardError().toStdString();
+    }
+    void kdd(const char* arguments) const { kdd(QString::fromLatin1(arguments).split(QLatin1Char(' '))); }
+    void add() const { kdd({QStringLiteral("add"), path("images")}); }
+
+    /// "studies?PatientName=*x*", as it stands in an address.
+    Http::Response get(const char* target)
+    {
+        const QList<QByteArray> parts = QByteArray(target).split('?');
+        Http::Request request;
+        request.base = "http://host";
+        request.path.append("dicom-web");
+        for (const QByteArray& segment : parts.front().split('/'))
+            request.path.append(segment);
+        for (const QByteArray& field : QByteArray(target).mid(parts.front().size() + 1).split('&')) {
+            const int equals = field.indexOf('=');
+            if (equals > 0)
+                request.query.append({QByteArray::fromPercentEncoding(field.left(equals)),
+                                      QByteArray::fromPercentEncoding(field.mid(equals + 1))});
+        }
+        ResourcePath resource;
+        EXPECT_TRUE(ResourcePath::parse(request.path.mid(1), resource));
+        SearchResource search(*mDatabase, mShelf);
+        ChangeFeed feed(*mDatabase);
+        return search.owns(resource) ? search.answer(request, resource) : feed.answer(request, resource);
+    }
+
+    static QByteArray bodyOf(const Http::Response& response)
+    {
+        return response.body.empty() ? QByteArray() : std::get<QByteArray>(response.body.front());
+    }
+
+    QJsonArray list(const char* target)
+    {
+        const Http::Response response = get(target);
+        EXPECT_EQ(response.status, 200) << target << ": " << bodyOf(response).toStdString();
+        QJsonParseError error = {};
+        const QJsonDocument json = QJsonDocument::fromJson(bodyOf(response), &error);
+        EXPECT_EQ(error.error, QJsonParseError::NoError) << bodyOf(response).toStdString();
+        return json.array();
+    }
+
+    /// The first value of an attribute of each object, separated by blanks.
+    std::string values(const char* target, const char* key)
+    {
+        QStringList texts;
+        for (const QJsonValue& object : list(target))
+            texts << textOf(object.toObject(), key);
+        return texts.join(QLatin1Char(' ')).toStdString();
+    }
+
+    static QString textOf(const QJsonObject& object, const char* key)
+    {
+        const QJsonValue value =
+            object.value(QLatin1String(key)).toObject().value(QLatin1String("Value")).toArray().first();
+        return value.isObject() ? value.toObject().value(QLatin1String("Alphabetic")).toString()
+                                : value.toVariant().toString();
+    }
+
+    std::string studies(const char* query) { return values((QByteArray("studies?") + query).constData(), "0020000D"); }
+
+    const QByteArray& address() const { return mAddress; }
+    StudyShelf& shelf() { return mShelf; }
+
+private:
+    QTemporaryDir mFolder;
+    QByteArray mAddress;
+    std::unique_ptr<ThreadSearch> mDatabase;
+    StudyShelf mShelf{1 << 28};
+};
+
+}  // namespace Kdd::DicomWeb
