@@ -1,8 +1,5 @@
 #pragma once
 
-#include "platform/base/LogFile.h"
-
-#include <algorithm>
 #include <mutex>
 #include <string>
 #include <vector>
@@ -14,26 +11,15 @@ namespace Kdd
 class LogCapture
 {
 public:
-    LogCapture()
-    {
-        LogFile::setCallback([this](LogFile::Severity, const char*, const std::string& line) {
-            const std::lock_guard lock(mMutex);
-            mLines.push_back(line);
-        });
-    }
-    ~LogCapture() { LogFile::setCallback({}); }
+    LogCapture();
+    ~LogCapture();
     LogCapture(const LogCapture&) = delete;
     LogCapture& operator=(const LogCapture&) = delete;
 
     const std::vector<std::string>& lines() const { return mLines; }
 
     /// How many lines contain the text.
-    int count(const std::string& text) const
-    {
-        return static_cast<int>(std::count_if(mLines.begin(), mLines.end(), [&](const std::string& line) {
-            return line.find(text) != std::string::npos;
-        }));
-    }
+    int count(const std::string& text) const;
 
 private:
     std::mutex mMutex;

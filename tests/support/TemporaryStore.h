@@ -1,7 +1,5 @@
 #pragma once
 
-#include "kddlib/tagfile/TagFile.h"
-
 #include <QString>
 #include <QTemporaryDir>
 
@@ -12,10 +10,7 @@ namespace Kdd
 class TemporaryStore
 {
 public:
-    TemporaryStore()
-    {
-        TagFile::setMetaFolder((folder() + QStringLiteral("/meta")).toLocal8Bit().constData());
-    }
+    TemporaryStore();
 
     QString folder() const { return mFolder.path(); }
     QString filePath(const char* name) const { return mFolder.filePath(QString::fromLatin1(name)); }
