@@ -82,16 +82,15 @@ public:
     {
         const QByteArray characterSet = characterSetOf(node, around);
         const View view = viewOf(node, holders, ownLevel);
+        // Before its items are looked at: however many these are, none of the node's own attributes is left out for them.
+        int left = qMin(view.size(), mEntriesLeft);
+        mEntriesLeft -= left;
+        mIsComplete = mIsComplete && left == view.size();
         QJsonArray written;
-        for (auto it = view.begin(); it != view.end(); ++it) {
+        for (auto it = view.begin(); it != view.end() && left > 0; ++it, --left) {
             const Shown& shown = it.value();
-            if (it.key().getGroup() == 0x0006 || (shown.element->markedAsMissing() && !shown.hides))
-                continue;
-            if (mEntriesLeft-- <= 0) {
-                mIsComplete = false;
-                break;
-            }
-            written.append(attribute(node, holders, it.key(), shown, characterSet));
+            if (it.key().getGroup() != 0x0006 && (!shown.element->markedAsMissing() || shown.hides))
+                written.append(attribute(node, holders, it.key(), shown, characterSet));
         }
         return written;
     }

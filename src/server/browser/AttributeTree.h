@@ -16,7 +16,7 @@ namespace Kdd::Browser
 constexpr int kMaxTreeEntries = 20000;
 
 /// Items of one sequence that are written out.
-constexpr int kMaxShownItems = 200;
+constexpr int kMaxShownItems = 1000;
 
 /// Every attribute that an image shows, and for each the node of the tree that holds it:
 ///
@@ -30,7 +30,7 @@ constexpr int kMaxShownItems = 200;
 /// "origin" is "study", "series" or "image"; in items it is the node whose sequence has the item that holds the value,
 /// which may stand above the one that holds the sequence. "hidden" is a mark by which a node says that it does not have
 /// what a node above holds. "length" stands beside a value that was cut. "complete" is false when there was more than
-/// an answer takes. The system's own group 0006 is left out.
+/// an answer takes; then items are missing before attributes of the image itself are. The system's own group 0006 is left out.
 QJsonObject attributeTree(const TagMap& image);
 
 }  // namespace Kdd::Browser
