@@ -26,7 +26,7 @@ KDD_EXPORT bool convertToUtf8(DcmItem& dataset);
 KDD_EXPORT bool convertValuesToUtf8(DcmItem& dataset);
 
 /// The same for one value by the character set of its item; the one declared stays. Whether it has changed.
-bool convertValueToUtf8(DcmElement& element, const QByteArray& characterSet);
+KDD_EXPORT bool convertValueToUtf8(DcmElement& element, const QByteArray& characterSet);
 
 /// Declares UTF-8 throughout a dataset of nothing but ASCII, unless it declares what no one knows.
 KDD_EXPORT void declareUtf8(DcmItem& dataset);

@@ -68,8 +68,7 @@ protected:
     {
         const QList<QByteArray> parts = QByteArray(target).split('?');
         Http::Request request;
-        request.base = "http://host";
-        request.path.append("dicom-web");
+        request.base = "http://host/dicom-web";
         for (const QByteArray& segment : parts.front().split('/'))
             request.path.append(segment);
         for (const QByteArray& field : QByteArray(target).mid(parts.front().size() + 1).split('&')) {
