@@ -18,7 +18,7 @@ TEST_F(Blocks, AllSayInWhichLanguageTheyAreAndAreTested)
 {
     // "text" is for layouts and diagrams, which nothing can run.
     const QStringList languages =
-        QStringLiteral("c cmake console cpp ini python sh text xml").split(QLatin1Char(' '));
+        QStringLiteral("c cmake console cpp ini nginx python sh text xml").split(QLatin1Char(' '));
     for (const Block& block : allBlocks())
         EXPECT_TRUE(languages.contains(block.language))
             << block.place() << " is in \"" << block.language.toStdString()
@@ -66,6 +66,13 @@ TEST_F(Blocks, ForTheShellAndCMakeAreWellFormed)
     for (const Block& block : blocksIn("cmake")) {
         putBeside("block.cmake", "if(FALSE)\n" + block.text.toUtf8() + "endif()\n");
         EXPECT_EQ(shell({QStringLiteral("cmake -P block.cmake")}).exitCode, 0) << block.place();
+    }
+    for (const Block& block : blocksIn("nginx")) {
+        putBeside("block.conf",
+                  "pid block.pid;\nerror_log stderr;\nevents {}\nhttp {\naccess_log off;\nserver {\n" +
+                      block.text.toUtf8() + "}\n}\n");
+        const Answer answer = shell({QStringLiteral("/usr/sbin/nginx -t -p . -c block.conf")});
+        EXPECT_EQ(answer.exitCode, 0) << block.place() << answer.err.toStdString();
     }
 }
 

@@ -47,7 +47,7 @@ TEST(SettingsPage, NamesEveryVariableThatIsReadAndNoOtherWithItsPlaceInTheFileAn
 TEST(SettingsPage, NamesWhatTheServicesSettingsBeginWith)
 {
     const std::set<std::string> known =
-        matches(pageText(kSettingsPage), "\\| `\\[([a-z]+)\\]` `([a-z]+)` \\|");
+        matches(pageText(QStringLiteral("docs/settings.md")), "\\| `\\[([a-z]+)\\]` `([a-z]+)` \\|");
     QString section;
     int count = 0;
     for (const QString& line :

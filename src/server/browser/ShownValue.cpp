@@ -76,7 +76,7 @@ QByteArray publicKey(const QByteArray& key)
 {
     if (DicomWeb::isUID(key))
         return key;
-    return "image-" + QCryptographicHash::hash(key, QCryptographicHash::Sha256).toHex().left(kDigestDigits);
+    return "object-" + QCryptographicHash::hash(key, QCryptographicHash::Sha256).toHex().left(kDigestDigits);
 }
 
 }  // namespace Kdd::Browser

@@ -49,7 +49,7 @@ ShownValue shownValue(const TagMap& node, const DcmTagKey& key, const QByteArray
 /// The same for a single short value by the node's own character set; empty when there is none.
 QString shortValue(const TagMap& node, const DcmTagKey& key);
 
-/// An object's name in addresses: its UID. Of those that have none, or something else in its place, a digest: images
+/// The name of a series or an image in addresses: its UID. Of those that have none, or something else in its place, a digest: images
 /// without UID are known by the path of their file, which concerns nobody outside.
 QByteArray publicKey(const QByteArray& key);
 

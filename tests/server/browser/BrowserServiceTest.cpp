@@ -108,12 +108,22 @@ TEST_F(BrowserTest, NamesAnImageWithoutUIDWithoutTellingItsPath)
         json("/browser/studies/1.2/series/1.3/images")[QStringLiteral("images")].toArray();
     ASSERT_EQ(images.size(), 1);
     const QByteArray key = images[0][QStringLiteral("key")].toString().toLatin1();
-    EXPECT_TRUE(key.startsWith("image-")) << key.constData();
+    EXPECT_TRUE(key.startsWith("object-")) << key.constData();
     const QByteArray attributes = "/browser/studies/1.2/images/" + key + "/attributes";
     EXPECT_EQ(text(json(attributes), "key"), key.toStdString());
     for (const QByteArray& target :
          {attributes, QByteArray("/browser/studies/1.2"), QByteArray("/browser/studies/1.2/sizes")})
         EXPECT_FALSE(bodyOf(get(target)).contains("secret")) << target.constData();
+}
+
+TEST_F(BrowserTest, OpensAStudyAndASeriesWhoseUIDsAreNone)
+{
+    write({image("1.4").inStudy("05fa-odd").inSeries("a/b")});
+    const QJsonValue series = json("/browser/studies/05fa-odd")[QStringLiteral("series")].toArray()[0];
+    const QByteArray key = series[QStringLiteral("key")].toString().toLatin1();
+    EXPECT_EQ(json("/browser/studies/05fa-odd/series/" + key + "/images")[QStringLiteral("count")].toInt(),
+              1);
+    EXPECT_EQ(get("/browser/studies/" + QByteArray(5000, '1')).status, 404);
 }
 
 TEST_F(BrowserTest, SendsThePageCompressedAndOnlyWhenItIsNew)

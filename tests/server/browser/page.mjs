@@ -174,9 +174,22 @@ async function walkHostile() {
   await until('words for a study that is not there', () => document.querySelector('.state')?.textContent.includes('no such study'));
 }
 
-/** What Chromium says of an answer that the page expects to fail is no fault of the page. */
+async function walkOffline() {
+  await page.goto(`${root}/#/`);
+  await present('.study');
+  await page.setOfflineMode(true);
+  await until('word of the lost connection', () => !document.getElementById('offline').hidden);
+  await page.keyboard.press('ArrowDown');
+  await page.keyboard.press('Enter');
+  await until('words for a server that is out of reach', () => document.querySelector('.state')?.textContent.includes('cannot be reached'));
+  await page.setOfflineMode(false);
+  await present('.banner');
+}
+
+/** What Chromium says of an answer that the walk expects to fail is no fault of the page. */
 function isExpected(fault) {
-  return fault.startsWith('console: Failed to load resource') && fault.includes('/browser/studies/1.2.3.4.5.6.7.8.9');
+  return fault.startsWith('console: Failed to load resource') &&
+    (fault.includes('/browser/studies/1.2.3.4.5.6.7.8.9') || fault.includes('ERR_INTERNET_DISCONNECTED'));
 }
 
 try {
@@ -185,6 +198,7 @@ try {
   await walkImage();
   await walkSides();
   await walkHostile();
+  await walkOffline();
 } catch (error) {
   faults.push(String(error));
 }

@@ -44,6 +44,9 @@ export async function readConfig(signal) {
 
 const part = encodeURIComponent;
 
+/** DICOMweb knows objects by their UIDs only. */
+const isUID = (name) => /^[0-9.]{1,64}$/.test(name);
+
 export const addresses = {
   study: (study) => `browser/studies/${part(study)}`,
   studyPreview: (study) => `browser/studies/${part(study)}/preview`,
@@ -53,7 +56,7 @@ export const addresses = {
   /** The stored preview, or one that is rendered; null when the image has none of either kind. */
   imagePreview: (study, series, image) => {
     if (image.preview) return `browser/studies/${part(study)}/images/${part(image.key)}/preview`;
-    if (!config.thumbnails || !image.pixels || !/^[0-9.]+$/.test(image.key)) return null;
+    if (!config.thumbnails || !image.pixels || ![study, series, image.key].every(isUID)) return null;
     return `${config.dicomWeb}/studies/${part(study)}/series/${part(series)}/instances/${part(image.key)}/thumbnail?viewport=128,128`;
   },
   zip: (study) => `${config.dicomWeb}/studies/${part(study)}?accept=application/zip`,

@@ -59,6 +59,11 @@ function tellFailure(view, fault) {
       { label: 'Try again', run: () => show(true) }));
 }
 
+/** Pictures that nobody will see would keep the next view waiting: a browser asks a server for six things at a time. */
+function stopPictures() {
+  for (const image of main.querySelectorAll('img')) if (!image.complete) image.removeAttribute('src');
+}
+
 /** What a view may do with the page while it is the one that is shown. */
 function makeView() {
   const ending = new AbortController();
@@ -81,6 +86,7 @@ async function show(isRetry = false) {
   // A view that only follows its own query stays, with what has the focus in it.
   if (!isRetry && current?.path === path && current.view.follow?.(query)) return;
   current?.view.end();
+  stopPictures();
   const isFirst = current === null;
   const view = makeView();
   current = { path, view };

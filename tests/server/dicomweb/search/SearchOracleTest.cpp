@@ -97,6 +97,15 @@ private:
 
     static bool matchesName(const QString& name, const QString& query)
     {
+        if (query.contains(QLatin1Char('='))) {
+            const QStringList wanted = query.split(QLatin1Char('='));
+            const QStringList groups = name.split(QLatin1Char('='));
+            for (int i = 0; i < wanted.size(); ++i) {
+                if (!wanted.at(i).isEmpty() && !matchesName(groups.value(i), wanted.at(i)))
+                    return false;
+            }
+            return true;
+        }
         QString parts;
         if (query.contains(QLatin1Char('^'))) {
             QStringList components;
