@@ -225,7 +225,7 @@ TEST_F(MetadataTest, HoldsOnlyTheFieldsThatAreNamed)
     } rows[] = {
         {"includefield=PatientName", 5},
         {"includefield=00100010,InstanceNumber&includefield=00080016", 7},
-        {"includefield=PatientName&includefield=all", 11},
+        {"includefield=PatientName&includefield=all", 8},
         {"includefield=", -1},
         {"includefield=NoSuchName", -1},
         {"includefield=../x", -1},
