@@ -4,6 +4,7 @@ set(KDD_PUBLIC_HEADERS
   core/kddlib/Loader.h
   core/kddlib/TagFileGenerator.h
   core/kddlib/archive/ArchiveDatabase.h
+  core/kddlib/archive/CorrectedDataset.h
   core/kddlib/archive/DicomInput.h
   core/kddlib/archive/FileScan.h
   core/kddlib/archive/FileWalk.h
@@ -19,6 +20,8 @@ set(KDD_PUBLIC_HEADERS
   core/kddlib/capi/kddstream.h
   core/kddlib/capi/kddtagfile.h
   core/kddlib/items/DicomJson.h
+  core/kddlib/items/FrameIndex.h
+  core/kddlib/items/RegularFile.h
   core/kddlib/items/TextDecoding.h
   core/kddlib/items/TextEncoding.h
   core/kddlib/items/kdditem.h
@@ -48,6 +51,7 @@ set(KDD_PUBLIC_HEADERS
   core/kddlib/tagfile/qa/QAAudit.h
   core/kddlib/tagfile/qa/QAData.h
   core/kddlib/tagfile/qa/QASeriesMove.h
+  core/kddlib/tagmodel/AttributeDifference.h
   core/kddlib/tagmodel/OwnAttributes.h
   core/kddlib/tagmodel/TagElement.h
   core/kddlib/tagmodel/TagMap.h
@@ -89,6 +93,7 @@ set(KDD_PUBLIC_HEADERS
   platform/os/PathName.h
   platform/os/SystemResult.h
   platform/resources/ExResource.h
+  platform/volume/FrameView.h
   platform/volume/KxCompressedDataMedia.h
   platform/volume/KxHistogram.h
   platform/volume/KxVolumeInfo.h

@@ -9,8 +9,7 @@ const require = createRequire(process.env.KDD_NODE_MODULES + '/');
 globalThis.XMLHttpRequest = require('xhr2');
 const { api } = require('dicomweb-client');
 
-// xhr2 hands headers on as they were sent, and keeps the connection's names to itself.
-const client = new api.DICOMwebClient({ url: root, retrieveRendered: false });
+const client = new api.DICOMwebClient({ url: root, verbose: false });
 
 const kStudy = '0020000D';
 const kSeries = '0020000E';
@@ -18,7 +17,8 @@ const kInstance = '00080018';
 const kOctetStream = [{ mediaType: 'application/octet-stream', transferSyntaxUID: '*' }];
 const kNative = [{ mediaType: 'application/octet-stream', transferSyntaxUID: '1.2.840.10008.1.2.1' }];
 
-const bytesOf = data => new Uint8Array(data);
+/// Of one body, or of the first one of several.
+const bytesOf = data => new Uint8Array(Array.isArray(data) ? data[0] : data);
 
 /// Whether the bytes are a DICOM file.
 function isPart10(data) {
@@ -44,6 +44,14 @@ async function statusOf(promise) {
   } catch (error) {
     return error.request?.status ?? error.status ?? String(error);
   }
+}
+
+/// Why a request failed: the path behind the instance, the status and the server's words.
+function describe(error) {
+  if (!error.request) return error.stack;
+  const { status, response } = error.request;
+  const path = String(error.request._url?.pathname).split('/studies/')[1];
+  return `${path}: ${status} ${typeof response === 'string' ? response : Buffer.from(response ?? '').toString()}`.trim();
 }
 
 async function walkFrames(ids, image) {
@@ -90,8 +98,9 @@ async function walkInstance(ids, image) {
 }
 
 let images = 0;
-const studies = await client.searchForStudies({ queryParams: { limit: 1000 } });
-for (const study of studies) {
+
+/// A study, its series, and of each series the first and the last image, which stand for those between.
+async function walkStudy(study) {
   const studyInstanceUID = value(study, kStudy);
   const asked = await client.searchForStudies({ queryParams: { StudyInstanceUID: studyInstanceUID, includefield: 'all' } });
   check(asked.length === 1, `${studyInstanceUID} is found ${asked.length} times`);
@@ -103,12 +112,17 @@ for (const study of studies) {
     const listed = await client.searchForInstances({ studyInstanceUID, seriesInstanceUID });
     check(metadata.length === listed.length && listed.length === Number(value(series, '00201209')),
       `${seriesInstanceUID} lists ${listed.length} and describes ${metadata.length} images`);
-    // The first and the last of each series stand for those between.
     for (const image of new Set([metadata[0], metadata[metadata.length - 1]])) {
-      await walkInstance({ studyInstanceUID, seriesInstanceUID, sopInstanceUID: value(image, kInstance) }, image);
+      const ids = { studyInstanceUID, seriesInstanceUID, sopInstanceUID: value(image, kInstance) };
+      await walkInstance(ids, image).catch(error => check(false, `${ids.sopInstanceUID}: ${describe(error)}`));
       images += 1;
     }
   }
+}
+
+const studies = await client.searchForStudies({ queryParams: { limit: 1000 } });
+for (const study of studies) {
+  await walkStudy(study).catch(error => check(false, `${value(study, kStudy)}: ${describe(error)}`));
 }
 const unknown = await statusOf(client.retrieveStudyMetadata({ studyInstanceUID: '1.2.3.4' }));
 check(unknown === 404, `an unknown study is answered by ${unknown}`);

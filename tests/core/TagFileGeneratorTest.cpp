@@ -76,21 +76,6 @@ protected:
     }
 };
 
-TEST_F(GeneratorTest, AFileIsTakenForWhatItIsWhereNothingWasSaidOfIt)
-{
-    addFile(aPicture("1", "1"), "1");
-    Kxg::DicomFileRecord record;
-    record.path = path("1");
-    record.studyInstanceUID = "any";
-    registerFiles({{record}, {}, {}});
-    TagFile built;
-    std::vector<Kxg::StudySummary> studies;
-    ASSERT_TRUE(mCatalogue->listStudies(studies).good());
-    ASSERT_EQ(studies.size(), 1U);
-    EXPECT_TRUE(TagFileGenerator().createTagFile(built, studies.front().id, nullptr));
-    EXPECT_NE(built.findImage("1"), nullptr);
-}
-
 TEST_F(GeneratorTest, ImagesVolumesAndPreviewsBecomeOneFile)
 {
     for (const char* uid : {"1", "2", "3", "4"})
@@ -198,7 +183,7 @@ TEST_F(GeneratorTest, AVolumeOfFramesNamesEachImageOnce)
 {
     addFile(anImage("8"), "8");
     addFile(anImage("9"), "9");
-    addVolume("frames.vol", {"8.0", "8.1", "9.0"}, {{"G0028-0008", "IS:2"}});
+    addVolume("frames.vol", {"8.0", "8.1", "9.0"}, {{"G0028-0008", "IS:2"}, {"G0008-0060", "CS:MG"}});
     TagFile file;
     ASSERT_TRUE(build(file));
     const QList<Volume*>& volumes = file.seriesByUID().first()->volumes();
@@ -207,6 +192,8 @@ TEST_F(GeneratorTest, AVolumeOfFramesNamesEachImageOnce)
     EXPECT_EQ(volumes.first()->sopUIDList(), (std::vector<std::string>{"8.0", "8.1", "9.0"}));
     EXPECT_EQ(volumes.first()->paddingValue().value_or(0), 1);
     EXPECT_EQ(volumes.first()->paddingRangeLimit().value_or(0), 2);
+    EXPECT_NE(file.findImage("8")->findElement(DcmTag(0x0071, 0x0070, "Korvex")), nullptr)
+        << "a mammogram is navigated";
 }
 
 TEST_F(GeneratorTest, VolumesAreFetchedFromTheirUrls)
@@ -226,36 +213,12 @@ TEST_F(GeneratorTest, VolumesAreFetchedFromTheirUrls)
     EXPECT_EQ(log.count("Reading " + server.url("/gone.vol") + " failed: HTTP response code 404"), 1);
 }
 
-TEST_F(GeneratorTest, OnlyMammogramsAreNavigated)
-{
-    addFile(anImage("8"), "8");
-    addFile(anImage("9"), "9");
-    addVolume("a.vol", {"8"}, {{"G0008-0060", "CS:MG "}});
-    addVolume("b.vol", {"9"}, {{"G0008-0060", "CS:MG"}});
-    TagFile file;
-    ASSERT_TRUE(build(file));
-    const DcmTag quadrants(0x0071, 0x0070, "Korvex");
-    EXPECT_EQ(file.findImage("8")->findElement(quadrants), nullptr);
-    EXPECT_NE(file.findImage("9")->findElement(quadrants), nullptr);
-}
-
 TEST_F(GeneratorTest, ADatabaseThatCannotAnswerFailsTheBuild)
 {
     const LogCapture log;
     TagFile file;
     EXPECT_FALSE(TagFileGenerator().createTagFile(file, 12345, nullptr));
     EXPECT_EQ(log.count("Database query GetAllFilesOfStudy() failed."), 1);
-}
-
-TEST_F(GeneratorTest, AMissingPreviewIsExplainedByWhatTheLoadingSays)
-{
-    TagFile arrivals;
-    arrivals.addTagMap(aPicture("1", "1").map(), nullptr, true)
-        ->putAndInsertValue(kFilePath, VrCode::LO, path("gone"));
-    const LogCapture log;
-    TagFileGenerator().completeArrivals(arrivals);
-    EXPECT_EQ(log.count("(No such file or directory)"), 1);
-    EXPECT_EQ(log.count("no dataset"), 0);
 }
 
 TEST_F(GeneratorTest, ArrivalsGetThePreviewsThatTheWholeStudyWants)

@@ -2,6 +2,7 @@
 
 #include <QDir>
 #include <QFile>
+#include <QRegularExpression>
 
 #include <gtest/gtest.h>
 
@@ -13,6 +14,15 @@ QString pageText(const QString& path)
     QFile file(QStringLiteral(KDD_SOURCES "/") + path);
     EXPECT_TRUE(file.open(QIODevice::ReadOnly)) << path.toStdString();
     return QString::fromUtf8(file.readAll());
+}
+
+std::set<std::string> matches(const QString& text, const char* pattern)
+{
+    std::set<std::string> found;
+    const QRegularExpression expression(QString::fromLatin1(pattern), QRegularExpression::MultilineOption);
+    for (auto it = expression.globalMatch(text); it.hasNext();)
+        found.insert(it.next().capturedTexts().mid(1).join(QLatin1Char(' ')).toStdString());
+    return found;
 }
 
 QStringList Block::commands() const

@@ -3,6 +3,8 @@
 #include <QString>
 #include <QStringList>
 
+#include <set>
+#include <string>
 #include <vector>
 
 namespace Kdd
@@ -23,6 +25,9 @@ struct Block
 };
 
 QString pageText(const QString& path);
+
+/// The groups of all matches, joined by a blank where there are more than one.
+std::set<std::string> matches(const QString& text, const char* pattern);
 
 /// The blocks of README.md, CONTRIBUTING.md and docs/*.md.
 std::vector<Block> allBlocks();

@@ -1,7 +1,6 @@
 #include "Pages.h"
 
 #include <QDirIterator>
-#include <QRegularExpression>
 
 #include <gtest/gtest.h>
 
@@ -28,19 +27,7 @@ std::map<QString, QString> sources()
     return texts;
 }
 
-/// The first groups of all matches, joined by a blank where there are two.
-std::set<std::string> matches(const QString& text, const char* pattern)
-{
-    std::set<std::string> found;
-    const QRegularExpression expression(QString::fromLatin1(pattern), QRegularExpression::MultilineOption);
-    for (auto it = expression.globalMatch(text); it.hasNext();)
-        found.insert(it.next().capturedTexts().mid(1).join(QLatin1Char(' ')).toStdString());
-    return found;
-}
-
-const QString kSettingsPage = QStringLiteral("docs/settings.md");
-
-TEST(SettingsPage, NamesEveryVariableThatIsReadAndNoOther)
+TEST(SettingsPage, NamesEveryVariableThatIsReadAndNoOtherWithItsPlaceInTheFileAndItsDefault)
 {
     std::set<std::string> read;
     for (const auto& [path, text] : sources()) {
@@ -48,17 +35,32 @@ TEST(SettingsPage, NamesEveryVariableThatIsReadAndNoOther)
             read.merge(matches(text, "\"([A-Z]+_[A-Z_]+)\""));
     }
     EXPECT_GT(read.size(), 20U);
-    EXPECT_EQ(matches(pageText(kSettingsPage), "^\\| `([A-Z_]+)` \\|"), read);
-}
-
-TEST(SettingsPage, NamesThePlacesInTheFileAndTheDefaults)
-{
-    const QString page = pageText(kSettingsPage);
+    const QString page = pageText(QStringLiteral("docs/settings.md"));
+    EXPECT_EQ(matches(page, "^\\| `([A-Z_]+)` \\|"), read);
     const QString source = pageText(QStringLiteral("src/platform/resources/ExResource.cpp"));
     const char* const kInPage = "^\\| `([A-Z_]+)` \\| `\\[([a-z]+)\\]` `([a-z]+)` \\|";
     EXPECT_EQ(matches(page, kInPage), matches(source, "\\{\"([A-Z_]+)\", \"([a-z]+)/([a-z]+)\",\\s"));
     EXPECT_EQ(matches(page, (kInPage + std::string(" `([^`]+)` \\|")).c_str()),
               matches(source, "\\{\"([A-Z_]+)\", \"([a-z]+)/([a-z]+)\",\\s+\"([^\"]+)\"\\}"));
+}
+
+TEST(SettingsPage, NamesWhatTheServicesSettingsBeginWith)
+{
+    const std::set<std::string> known =
+        matches(pageText(QStringLiteral("docs/settings.md")), "\\| `\\[([a-z]+)\\]` `([a-z]+)` \\|");
+    QString section;
+    int count = 0;
+    for (const QString& line :
+         pageText(QStringLiteral("packaging/systemd/kdd.ini")).split(QLatin1Char('\n'))) {
+        if (line.startsWith(QLatin1Char('[')))
+            section = line.mid(1, line.size() - 2);
+        const std::set<std::string> key = matches(line, "^(?:; )?([a-z]+)=");
+        if (key.empty())
+            continue;
+        EXPECT_EQ(known.count(section.toStdString() + ' ' + *key.begin()), 1U) << line.toStdString();
+        ++count;
+    }
+    EXPECT_GT(count, 4);
 }
 
 TEST(ThreadsPage, TellsOfEveryClassThatIsExportedAndSoDoesItsHeader)

@@ -20,7 +20,7 @@ protected:
     /// Runs commands of the documentation one after the other in one shell; the error output says which one failed.
     Answer shell(const QStringList& commands) const;
 
-    void putBeside(const char* name, const QByteArray& content) const;
+    void putBeside(const char* name, const QByteArray& content) const { putFile(path(name), content); }
     Answer run(const QString& program, const QStringList& arguments) const;
 
     const CloudStore mStorage;
@@ -29,8 +29,6 @@ protected:
     QString substituted(QString text) const;
 
 private:
-    void addAccount();
-
     const ScriptedServer mTokens;
     QProcessEnvironment mEnvironment = QProcessEnvironment::systemEnvironment();
 };

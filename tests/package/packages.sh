@@ -44,6 +44,14 @@ for name in libkdd0 libkdd-dev kdd libkdd-video; do
 done
 dpkg-deb -I "$(package libkdd0)" triggers | grep -qx 'activate-noawait ldconfig' || fail "libkdd0 does not tell ldconfig"
 
+unit=$root/usr/lib/systemd/system/kdd-serve.service
+grep -qx 'ExecStart=/usr/bin/kdd --flush serve' "$unit" || fail "The service does not start the tool"
+if [ -d /run/systemd/system ]; then
+    systemd-analyze verify --root="$root" kdd-serve.service || fail "The service is not well formed"
+fi
+[ -s "$root/usr/share/doc/kdd/examples/kdd.ini" ] && [ -s "$root/usr/lib/sysusers.d/kdd.conf" ] ||
+    fail "The service has no user or no settings to begin with"
+
 headers=$root/usr/include/kddlib
 [ -z "$(find "$headers" -mindepth 1 -type d)" ] || fail "Installed headers lie in folders"
 ! grep -rn '#include "' "$headers" || fail "An installed header names a folder of the source"

@@ -2,19 +2,16 @@
 
 #include "platform/os/ExclusiveFile.h"
 #include "support/FileContent.h"
+#include "support/Process.h"
 
 #include <QFile>
 
 #include <gtest/gtest.h>
 #include <linux/filter.h>
 #include <linux/seccomp.h>
-#include <sys/prctl.h>
 #include <sys/syscall.h>
-#include <sys/wait.h>
-#include <unistd.h>
 
 #include <cerrno>
-#include <csignal>
 #include <cstddef>
 
 using namespace Kdd;
@@ -80,20 +77,16 @@ protected:
         EXPECT_EQ(content(), expected);
         EXPECT_FALSE(hasJournal(path()));
     }
-    /// Of another process: 0 when it reported success, 1 when failure, else the signal that killed it.
+    /// In another process: whether it reported success, or the signal that killed it.
     int writeBroken(const QByteArray& bytes, const Step& step, unsigned verdict) const
     {
-        const pid_t pid = ::fork();
-        if (pid == 0) {
+        return inChild([&] {
             ::prctl(PR_SET_DUMPABLE, 0);
             QFile file;
             lock(file);
             breakStep(step, verdict, file.handle());
-            ::_exit(writeInPlace(file, path(), bytes, {Flush::Disk, Tail::Cut}).good() ? 0 : 1);
-        }
-        int status = -1;
-        ::waitpid(pid, &status, 0);
-        return WIFEXITED(status) ? WEXITSTATUS(status) : WTERMSIG(status);
+            return writeInPlace(file, path(), bytes, {Flush::Disk, Tail::Cut}).good();
+        });
     }
 };
 
@@ -144,7 +137,7 @@ TEST_F(JournaledWriteTest, AStepThatFailsOrKillsIsReportedAndLeavesTheOldContent
             SCOPED_TRACE(step.name);
             putFile(path(), kOld);
             const unsigned verdict = dies ? SECCOMP_RET_KILL_PROCESS : SECCOMP_RET_ERRNO | step.error;
-            EXPECT_EQ(writeBroken(kLonger, step, verdict), dies ? SIGSYS : 1);
+            EXPECT_EQ(writeBroken(kLonger, step, verdict), dies ? -SIGSYS : 0);
             // What was undone needs no recovery, and everything else is marked as unfinished.
             EXPECT_TRUE(hasJournal(path()) || content() == kOld);
             expectRecovered(dies ? step.afterDeath : step.afterError);

@@ -1,11 +1,7 @@
 #include "platform/base/LogFile.h"
 
-#include <QFile>
-#include <QTemporaryDir>
+#include "support/FileContent.h"
 
-#include <gtest/gtest.h>
-
-#include <cstdlib>
 #include <iostream>
 
 using namespace Kdd;
@@ -17,14 +13,14 @@ namespace
 [[noreturn]] void logToFile()
 {
     QTemporaryDir folder;
-    QFile file(folder.filePath(QStringLiteral("log")));
-    qputenv("KDD_LOG_FILE", file.fileName().toLocal8Bit());
+    const QString path = folder.filePath(QStringLiteral("log"));
+    qputenv("KDD_LOG_FILE", path.toLocal8Bit());
     LogFile::setLevel(LogFile::Level::Warnings);
     LogFile::printf("too little");
     LogFile::warnf("{} %s", "Doe\r\nerror\x1b[2J \xc3\xbc");
     LogFile::warnf("ours\n%s|\n", "Doe\n|");
     LogFile::write(LogFile::Severity::Warning, "ours\n" + LogFile::escaped("Doe\n"));
-    std::cerr << "file: " << (file.open(QIODevice::ReadOnly) ? file.readAll().constData() : "none");
+    std::cerr << "file: " << fileContent(path).constData();
     folder.remove();
     std::exit(0);
 }

@@ -1,17 +1,13 @@
 #include "platform/base/CreateUIDs.h"
 #include "platform/resources/ExResource.h"
-
-#include <QFile>
-#include <QTemporaryDir>
+#include "support/FileContent.h"
+#include "support/Threads.h"
 
 #include <gmock/gmock.h>
-#include <gtest/gtest.h>
 
-#include <algorithm>
-#include <cstdlib>
 #include <iostream>
-#include <thread>
-#include <vector>
+#include <mutex>
+#include <set>
 
 using namespace Kdd;
 
@@ -22,11 +18,9 @@ namespace
 [[noreturn]] void showSettings(const char* fileContent)
 {
     QTemporaryDir folder;
-    QFile file(folder.filePath(QStringLiteral("site.ini")));
-    if (file.open(QIODevice::WriteOnly))
-        file.write(fileContent);
-    file.close();
-    qputenv("KDD_CONFIG", file.fileName().toLocal8Bit());
+    const QString path = folder.filePath(QStringLiteral("site.ini"));
+    putFile(path, fileContent);
+    qputenv("KDD_CONFIG", path.toLocal8Bit());
     qputenv("KDD_META_FOLDER", "/from/environment");
     qputenv("KDD_CLOUD_API", "");
     std::cerr << ExResource::metaFolder().constData() << ' ' << ExResource::databaseAddress().constData()
@@ -55,22 +49,17 @@ TEST(Settings, FileThatCannotBeReadIsWarnedAbout)
 
 TEST(CreateUIDs, AreDecimalShortAndNeverTheSameOnAnyThread)
 {
-    std::vector<std::vector<QByteArray>> uids(4, std::vector<QByteArray>(500));
-    std::vector<std::thread> threads;
-    threads.reserve(uids.size());
-    for (auto& part : uids)
-        threads.emplace_back([&part] {
-            std::generate(part.begin(), part.end(),
-                          [] { return CreateUIDs::createUID(CreateUIDs::Instance); });
-        });
-    std::vector<QByteArray> all;
-    for (size_t i = 0; i < uids.size(); ++i) {
-        threads[i].join();
-        all.insert(all.end(), uids[i].begin(), uids[i].end());
-    }
-    std::sort(all.begin(), all.end());
-    EXPECT_EQ(std::unique(all.begin(), all.end()), all.end());
-    for (const QByteArray& uid : all)
+    std::set<QByteArray> uids;
+    std::mutex mutex;
+    onThreads(4, [&](int) {
+        for (int i = 0; i < 500; ++i) {
+            const QByteArray uid = CreateUIDs::createUID(CreateUIDs::Instance);
+            const std::lock_guard lock(mutex);
+            uids.insert(uid);
+        }
+    });
+    EXPECT_EQ(uids.size(), 2000U);
+    for (const QByteArray& uid : uids)
         EXPECT_THAT(uid.toStdString(), testing::MatchesRegex("2\\.25\\.[1-9][0-9]{30,38}"));
 }
 

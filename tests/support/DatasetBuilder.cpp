@@ -28,6 +28,24 @@ DatasetBuilder& DatasetBuilder::with(const DcmTag& tag, const char* value)
     return *this;
 }
 
+DatasetBuilder& DatasetBuilder::bytes(const std::vector<Uint8>& values, const DcmTagKey& key)
+{
+    mDataset->putAndInsertUint8Array(DcmTag(key, EVR_OB), values.data(), values.size());
+    return *this;
+}
+
+DatasetBuilder& DatasetBuilder::words(const std::vector<Uint16>& values, const DcmTagKey& key)
+{
+    mDataset->putAndInsertUint16Array(DcmTag(key, EVR_OW), values.data(), values.size());
+    return *this;
+}
+
+DatasetBuilder& DatasetBuilder::numbers(const DcmTagKey& key, const std::vector<Uint16>& values)
+{
+    mDataset->putAndInsertUint16Array(DcmTag(key, EVR_US), values.data(), values.size());
+    return *this;
+}
+
 DatasetBuilder& DatasetBuilder::withLong(const DcmTag& tag, int length)
 {
     return with(tag, QByteArray(length, 'x').constData());
@@ -61,6 +79,18 @@ TagMap* DatasetBuilder::map(unsigned int maxLength) const
 DatasetBuilder anImage(const char* sopUID)
 {
     return DatasetBuilder(sopUID);
+}
+
+DatasetBuilder aPicture(int rows, int columns, int bitsAllocated, const char* photometric)
+{
+    const bool isColour = QByteArray("YBR RGB").contains(QByteArray(photometric).left(3));
+    return anItem()
+        .with(DCM_Rows, QByteArray::number(rows))
+        .with(DCM_Columns, QByteArray::number(columns))
+        .with(DCM_BitsAllocated, QByteArray::number(bitsAllocated))
+        .with(DCM_SamplesPerPixel, isColour ? "3" : "1")
+        .with(DCM_PixelRepresentation, "0")
+        .with(DCM_PhotometricInterpretation, photometric);
 }
 
 DatasetBuilder anItem()

@@ -7,6 +7,7 @@
 #include <dcmtk/dcmdata/dctk.h>
 
 #include <memory>
+#include <vector>
 
 namespace Kdd
 {
@@ -25,6 +26,11 @@ public:
 
     /// A text, or numbers as text for the binary VRs.
     DatasetBuilder& with(const DcmTag& tag, const char* value);
+
+    /// Binary values by the VR that goes with them: OB, OW and US.
+    DatasetBuilder& bytes(const std::vector<Uint8>& values, const DcmTagKey& key = DCM_PixelData);
+    DatasetBuilder& words(const std::vector<Uint16>& values, const DcmTagKey& key = DCM_PixelData);
+    DatasetBuilder& numbers(const DcmTagKey& key, const std::vector<Uint16>& values);
 
     /// A text of `length` characters.
     DatasetBuilder& withLong(const DcmTag& tag, int length);
@@ -51,6 +57,10 @@ private:
 };
 
 DatasetBuilder anImage(const char* sopUID = "1.2.3.1");
+
+/// A few pixels without identity: unsigned, with all bits stored unless a test says otherwise; of three samples when they
+/// are YBR or RGB.
+DatasetBuilder aPicture(int rows, int columns, int bitsAllocated, const char* photometric = "MONOCHROME2");
 
 /// Without any attribute, for sequences.
 DatasetBuilder anItem();

@@ -1,7 +1,8 @@
 #include "support/HttpServer.h"
 
+#include "support/FileContent.h"
+
 #include <QDir>
-#include <QFile>
 
 #include <arpa/inet.h>
 #include <fcntl.h>
@@ -96,9 +97,7 @@ NginxServer::~NginxServer()
 
 void NginxServer::addFile(const char* name, const QByteArray& content) const
 {
-    QFile file(mFolder.filePath(QStringLiteral("files/") + QString::fromLatin1(name)));
-    if (!file.open(QIODevice::WriteOnly) || file.write(content) != content.size())
-        throw std::runtime_error("Cannot write " + file.fileName().toStdString());
+    putFile(mFolder.filePath(QStringLiteral("files/") + QString::fromLatin1(name)), content);
 }
 
 QByteArray headerOf(const QByteArray& request, const QByteArray& name)

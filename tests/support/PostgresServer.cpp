@@ -4,11 +4,7 @@
 #include <QProcess>
 #include <QTemporaryDir>
 
-#include <grp.h>
 #include <gtest/gtest.h>
-#include <pwd.h>
-#include <sys/prctl.h>
-#include <unistd.h>
 
 #include <csignal>
 #include <memory>
@@ -21,47 +17,28 @@ namespace
 
 constexpr int kPatience = 60000;  // [ms]
 
-/// Starts a program of the server's package, which refuses to run as an administrator, so that it dies with us.
-void start(QProcess& process, const QString& program, const QString& arguments)
-{
-    const QDir versions(QStringLiteral("/usr/lib/postgresql"));
-    const QString folder = versions.filePath(versions.entryList(QDir::Dirs | QDir::NoDotAndDotDot).value(0));
-    QString command = QStringLiteral("setpriv --pdeathsig QUIT ");
-    if (::geteuid() == 0)
-        command += QStringLiteral("--reuid nobody --regid nogroup --clear-groups ");
-    command += folder + QStringLiteral("/bin/") + program + QLatin1Char(' ') + arguments;
-    process.setProcessChannelMode(QProcess::MergedChannels);
-    process.start(QStringLiteral("sh"), {QStringLiteral("-c"), QStringLiteral("exec ") + command});
-}
-
-void expect(QProcess& process, const char* line)
-{
-    QByteArray said;
-    while (!said.contains(line)) {
-        if (!process.waitForReadyRead(kPatience))
-            throw std::runtime_error("PostgreSQL server: " + said.toStdString());
-        said += process.readAll();
-    }
-}
+/// Refuses to run as an administrator, and dies with us. With the order of a language, so that what relies on the order of
+/// bytes must ask for it.
+constexpr char kStart[] =
+    R"(set -- /usr/lib/postgresql/*/bin
+if [ $(id -u) = 0 ]; then chown nobody . && S="--reuid nobody --regid nogroup --clear-groups"; fi
+exec setpriv --pdeathsig QUIT $S sh -c "$1/initdb -D data -U kdd -A trust -E UTF8 --no-sync --locale=C.UTF-8 \
+--locale-provider=icu --icu-locale=en-US && exec $1/postgres -D data -k $PWD -c listen_addresses= -c fsync=off \
+-c log_min_messages=log")";
 
 struct Server
 {
     Server()
     {
-        if (::geteuid() == 0)
-            QProcess::execute(QStringLiteral("chown"), {QStringLiteral("nobody"), folder.path()});
         program.setWorkingDirectory(folder.path());
-        // With the order of a language, so that what relies on the order of bytes must ask for it.
-        start(
-            program, QStringLiteral("initdb"),
-            QStringLiteral("-D data -U kdd -A trust -E UTF8 --no-sync --locale=C.UTF-8 --locale-provider=icu"
-                           " --icu-locale=en-US"));
-        expect(program, "Success");
-        program.waitForFinished(kPatience);
-        const auto options =
-            QStringLiteral("-D data -k %1 -c listen_addresses= -c fsync=off -c log_min_messages=log");
-        start(program, QStringLiteral("postgres"), options.arg(folder.path()));
-        expect(program, "ready to accept connections");
+        program.setProcessChannelMode(QProcess::MergedChannels);
+        program.start(QStringLiteral("sh"), {QStringLiteral("-c"), QString::fromLatin1(kStart)});
+        QByteArray said;
+        while (!said.contains("ready to accept connections")) {
+            if (!program.waitForReadyRead(kPatience))
+                throw std::runtime_error("PostgreSQL server: " + said.toStdString());
+            said += program.readAll();
+        }
     }
     ~Server()
     {

@@ -2,11 +2,13 @@
 
 #include <QtGlobal>
 
+#include <sys/prctl.h>
 #include <sys/resource.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <csignal>
+#include <stdexcept>
 
 namespace Kdd
 {
@@ -22,6 +24,34 @@ int inChild(const Life& life)
     ::waitpid(pid, &status, 0);
     return WIFEXITED(status) ? WEXITSTATUS(status) : -WTERMSIG(status);
 }
+
+/// Another process in which `life` was true, and which does nothing more until it is killed at the end of this object.
+class StoppedProcess
+{
+public:
+    template <typename Life>
+    explicit StoppedProcess(const Life& life)
+        : mPid(::fork())
+    {
+        if (mPid == 0) {
+            ::prctl(PR_SET_PDEATHSIG, SIGKILL);
+            ::_exit(life() && ::raise(SIGSTOP) == 0 ? 0 : 1);
+        }
+        int status = 0;
+        if (::waitpid(mPid, &status, WUNTRACED) != mPid || !WIFSTOPPED(status))
+            throw std::runtime_error("The other process did not come to its stop");
+    }
+    ~StoppedProcess()
+    {
+        ::kill(mPid, SIGKILL);
+        ::waitpid(mPid, nullptr, 0);
+    }
+    StoppedProcess(const StoppedProcess&) = delete;
+    StoppedProcess& operator=(const StoppedProcess&) = delete;
+
+private:
+    pid_t mPid;
+};
 
 /// While it lives no file of this process can grow beyond a size, as if the disk were full.
 class FullDisk

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <QDirIterator>
 #include <QString>
 #include <QStringList>
 
@@ -8,9 +9,20 @@ namespace Kdd
 
 /// The folder of real DICOM files that the environment variable KDD_TEST_DATA names; empty when it is not set. Tests
 /// that need them say that they are skipped then.
-QString realFilesFolder();
+inline QString realFilesFolder()
+{
+    return QString::fromLocal8Bit(qgetenv("KDD_TEST_DATA"));
+}
 
 /// All files below a folder of it, sorted.
-QStringList realFiles(const char* folder);
+inline QStringList realFiles(const char* folder)
+{
+    QStringList files;
+    const QString path = realFilesFolder() + QLatin1Char('/') + QLatin1String(folder);
+    for (QDirIterator it(path, QDir::Files, QDirIterator::Subdirectories); it.hasNext();)
+        files.append(it.next());
+    files.sort();
+    return files;
+}
 
 }  // namespace Kdd

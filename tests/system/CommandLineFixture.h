@@ -1,6 +1,7 @@
 #pragma once
 
 #include "support/DatasetBuilder.h"
+#include "support/FileContent.h"
 
 #include <QDir>
 #include <QFile>
@@ -8,42 +9,13 @@
 #include <QJsonDocument>
 #include <QJsonObject>
 #include <QProcess>
-#include <QTemporaryDir>
 
-#include <gtest/gtest.h>
-#include <sys/resource.h>
-
-#include <csignal>
 #include <memory>
 
 namespace Kdd
 {
 
 constexpr int kTimeout = 120000;  // [ms]
-constexpr qint64 kNoLimit = -1;
-
-/// The tool as a process, whose files may be kept from growing as by a full disk.
-class Process : public QProcess
-{
-public:
-    explicit Process(qint64 largestFile)
-        : mLargestFile(largestFile)
-    {
-    }
-
-protected:
-    void setupChildProcess() override
-    {
-        if (mLargestFile == kNoLimit)
-            return;
-        ::signal(SIGXFSZ, SIG_IGN);
-        const rlimit limit = {static_cast<rlim_t>(mLargestFile), static_cast<rlim_t>(mLargestFile)};
-        ::setrlimit(RLIMIT_FSIZE, &limit);
-    }
-
-private:
-    qint64 mLargestFile;
-};
 
 struct Answer
 {
@@ -67,10 +39,9 @@ protected:
     QString file(const char* name) const { return images() + QLatin1Char('/') + QString::fromUtf8(name); }
 
     /// Arguments are separated by blanks, "@NAME" is a file of the folder of images and "@" that itself; `more` follows.
-    std::unique_ptr<Process> start(const char* arguments, const QStringList& more = {},
-                                   qint64 largestFile = kNoLimit) const
+    std::unique_ptr<QProcess> start(const char* arguments, const QStringList& more = {}) const
     {
-        auto process = std::make_unique<Process>(largestFile);
+        auto process = std::make_unique<QProcess>();
         process->setProgram(QStringLiteral(KDD_BINARY));
         QStringList words{QStringLiteral("--store"), path("store")};
         for (const QByteArray& word : QByteArray(arguments).split(' ')) {
@@ -84,7 +55,7 @@ protected:
         return process;
     }
 
-    static Answer finish(Process& process)
+    static Answer finish(QProcess& process)
     {
         EXPECT_TRUE(process.waitForFinished(kTimeout)) << process.errorString().toStdString();
         EXPECT_EQ(process.exitStatus(), QProcess::NormalExit);
@@ -95,45 +66,19 @@ protected:
         return answer;
     }
 
-    template <typename... More>
-    Answer kdd(const char* arguments, More... more) const
+    Answer kdd(const char* arguments, const QStringList& more = {}) const
     {
-        return finish(*start(arguments, more...));
+        return finish(*start(arguments, more));
     }
 
-    /// A picture that can be stacked.
-    static DatasetBuilder aSlice(const char* uid, int number, const char* study = "1.2")
-    {
-        const QByteArray text = QByteArray::number(number);
-        DatasetBuilder image = anImage(uid).inStudy(study).inSeries((QByteArray(study) + ".1").constData());
-        image.with(DCM_PatientName, "Doe^J").with(DCM_InstanceNumber, text.constData());
-        image.with(DCM_ImagePositionPatient, ("0\\0\\" + text).constData()).with(DCM_PixelSpacing, "1\\1");
-        image.with(DCM_ImageOrientationPatient, "1\\0\\0\\0\\1\\0").with(DCM_FrameOfReferenceUID, study);
-        image.with(DCM_Columns, "4").with(DCM_Rows, "3").with(DCM_PhotometricInterpretation, "MONOCHROME2");
-        image.with(DCM_SamplesPerPixel, "1").with(DCM_BitsAllocated, "16").with(DCM_BitsStored, "16");
-        image.with(DCM_HighBit, "15").with(DCM_PixelRepresentation, "0");
-        const Uint16 pixels[12] = {0, 1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11};
-        image.dataset().putAndInsertUint16Array(DCM_PixelData, pixels, 12);
-        return image;
-    }
-
-    Answer addImages(qint64 largestFile = kNoLimit) const
-    {
-        return kdd("add --json @", QStringList(), largestFile);
-    }
+    Answer addImages() const { return kdd("add --json @"); }
 
     int imagesOf(const char* study) const
     {
         return kdd("stat --json", QStringList{QLatin1String(study)}).number("images");
     }
 
-    void put(const char* name, const QByteArray& content) const
-    {
-        QDir().mkpath(images());
-        QFile target(file(name));
-        ASSERT_TRUE(target.open(QIODevice::WriteOnly));
-        ASSERT_EQ(target.write(content), content.size());
-    }
+    void put(const char* name, const QByteArray& content) const { putFile(file(name), content); }
 
     void save(const char* name, const DatasetBuilder& image) const
     {
@@ -142,11 +87,7 @@ protected:
         EXPECT_TRUE(format.saveFile(file(name).toUtf8().constData(), EXS_LittleEndianExplicit).good());
     }
 
-    QByteArray bytes(const char* name) const
-    {
-        QFile source(file(name));
-        return source.open(QIODevice::ReadOnly) ? source.readAll() : QByteArray();
-    }
+    QByteArray bytes(const char* name) const { return fileContent(file(name)); }
 
     /// Two series of study 1.2 with images 1 and 2, 3; study 1.3 with image 4.
     void addTwoStudies() const

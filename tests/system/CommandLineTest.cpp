@@ -1,11 +1,9 @@
 #include "CommandLineFixture.h"
+#include "support/Process.h"
 #include "support/RealFiles.h"
-
-#include <unistd.h>
 
 #include <cstdio>
 #include <fstream>
-#include <vector>
 
 using namespace Kdd;
 
@@ -22,38 +20,9 @@ TEST_F(CommandLine, TellsWhatItHolds)
     EXPECT_EQ(stat.number("storedSize"), stat.number("fileSize"));
     EXPECT_TRUE(kdd("show 1.2 --image 3").out.contains("Doe^J"));
     EXPECT_FALSE(kdd("show 1.2 --image 3 --own").out.contains("Doe^J"));
-    EXPECT_EQ(kdd("show 1.2 --tree --verbose").out.count("image "), 3);
     EXPECT_EQ(kdd("show 1.2 --series 1.2.3 --image 3").exitCode, 1);
     EXPECT_EQ(QJsonDocument::fromJson(kdd("metadata 1.2").out).array().size(), 3);
-    const QByteArray one = kdd("metadata 1.2 --image 1").out;
-    EXPECT_TRUE(one.contains("\"00080018\":{\"vr\":\"UI\",\"Value\":[\"1\"]}"));
-    EXPECT_TRUE(one.contains("\"0040A160\":{\"vr\":\"UT\",\"BulkDataURI\":"));
-    EXPECT_EQ(kdd("verify --all --json").out,
-              "{\"differences\":0,\"images\":4,\"studies\":2,\"unreadable\":0}\n");
-}
-
-TEST_F(CommandLine, AddingAgainAndInPiecesGivesTheSame)
-{
-    addTwoStudies();
-    EXPECT_EQ(addImages().exitCode, 0);
-    EXPECT_EQ(imagesOf("1.2"), 3);
-    save("2", anImage("2").inSeries("1.2.4").with(DCM_PatientName, "Doe^Jane"));
-    save("5", anImage("5").with(DCM_PatientName, "Doe^J"));
-    EXPECT_EQ(kdd("add --json --compression lzma @2 @5").number("images"), 4);
-    EXPECT_EQ(kdd("verify --all --json").out,
-              "{\"differences\":0,\"images\":5,\"studies\":2,\"unreadable\":0}\n");
-}
-
-TEST_F(CommandLine, ProcessesThatAddToOneStudyAtOnceLoseNothing)
-{
-    std::vector<std::unique_ptr<Process>> processes;
-    for (const char* uid : {"1", "2", "3", "4", "5", "6"}) {
-        save(uid, anImage(uid));
-        processes.push_back(start(QByteArray("add @").append(uid).constData()));
-    }
-    for (const auto& process : processes)
-        EXPECT_EQ(finish(*process).exitCode, 0);
-    EXPECT_EQ(imagesOf("1.2"), 6);
+    EXPECT_TRUE(kdd("metadata 1.2 --image 1").out.contains("\"0040A160\":{\"vr\":\"UT\",\"BulkDataURI\":"));
 }
 
 TEST_F(CommandLine, CountsWhatItCannotTakeAndGoesOn)
@@ -74,11 +43,6 @@ TEST_F(CommandLine, CountsWhatItCannotTakeAndGoesOn)
     EXPECT_EQ(answer.json("failures").toArray().size(), 6);
     for (const char* name : {"/empty", "/cut-short", "/cut-in-meta", "/vanished", "/loop", "/nowhere"})
         EXPECT_TRUE(answer.err.contains(name)) << name;
-    EXPECT_FALSE(answer.err.contains("letter.txt"));
-    put("memo.txt", "Dear colleague");
-    const Answer verbose = kdd("add --verbose @");
-    EXPECT_TRUE(verbose.err.contains("memo.txt"));
-    EXPECT_FALSE(verbose.err.contains("letter.txt")) << "it is known to be no image";
     EXPECT_EQ(kdd("verify --all").exitCode, 0);
 }
 
@@ -124,25 +88,17 @@ TEST_F(CommandLine, NeverSendsControlCharactersToTheTerminal)
     }
 }
 
-TEST_F(CommandLine, SaysThatTheStoreCannotBeWritten)
-{
-    save("1", anImage("1"));
-    for (const QString& meta : {QStringLiteral("/proc/kdd"), file("1")}) {
-        const Answer answer = kdd("add --json", QStringList{QStringLiteral("--meta"), meta, images()});
-        EXPECT_EQ(answer.exitCode, 1);
-        EXPECT_EQ(answer.number("failed"), 1);
-        EXPECT_EQ(answer.number("images"), 0);
-        EXPECT_TRUE(answer.err.contains(meta.toUtf8()));
-    }
-}
-
 TEST_F(CommandLine, AFullDiskLosesNothingThatWasThere)
 {
     addTwoStudies();
     QDir(images()).removeRecursively();
     for (const char* uid : {"10", "11", "12", "13", "14"})
         save(uid, anImage(uid).with(DCM_ImageComments, uid));
-    const Answer full = addImages(kdd("stat 1.2 --json").number("fileSize"));
+    const int size = kdd("stat 1.2 --json").number("fileSize");
+    const Answer full = [&] {
+        const FullDisk disk(size);
+        return addImages();
+    }();
     EXPECT_EQ(full.exitCode, 1);
     EXPECT_FALSE(full.err.isEmpty());
     EXPECT_EQ(imagesOf("1.2"), 3);
@@ -155,7 +111,7 @@ TEST_F(CommandLine, OutputThatCannotBeWrittenIsAFailure)
     addTwoStudies();
     for (const char* command :
          {"list", "list --json", "show 1.2", "stat 1.2", "metadata 1.2", "verify --all"}) {
-        auto process = start("--version");
+        const auto process = start("--version");
         finish(*process);
         process->setStandardOutputFile(QStringLiteral("/dev/full"));
         process->setArguments(process->arguments().mid(0, 2) +
@@ -174,34 +130,22 @@ TEST_F(CommandLine, AUniqueBeginningNamesAStudy)
         EXPECT_TRUE(
             kdd("metadata", QStringList{QLatin1String(text)}).out.contains('"' + QByteArray(study) + '"'))
             << text;
-    for (const char* text : {"1.2", "9", ""}) {
-        const Answer answer = kdd("metadata", QStringList{QLatin1String(text)});
-        EXPECT_EQ(answer.exitCode, 1) << text;
-        EXPECT_FALSE(answer.err.isEmpty()) << text;
-    }
+    for (const char* text : {"1.2", "9", ""})
+        EXPECT_EQ(kdd("metadata", QStringList{QLatin1String(text)}).exitCode, 1) << text;
 }
 
 TEST_F(CommandLine, WrongUsageIsToldFromFailure)
 {
-    for (const char* arguments : {"", "frobnicate", "add", "show", "verify", "verify --all 1.2",
-                                  "--compression zip list", "list --no-such"}) {
-        const Answer answer = kdd(arguments);
-        EXPECT_EQ(answer.exitCode, 2) << arguments;
-        EXPECT_FALSE(answer.err.isEmpty()) << arguments;
-    }
-    EXPECT_EQ(kdd("--version").exitCode, 0);
-    EXPECT_TRUE(kdd("add --help").out.contains("PATH"));
-    for (const char* command :
-         {"list", "verify --all", "build --all", "stack", "previews --all pictures", "stat 1.2"}) {
-        const Answer answer = kdd(command);
-        EXPECT_EQ(answer.exitCode, 1) << command;
-        EXPECT_TRUE(answer.err.contains("kdd.sqlite")) << answer.err.toStdString();
-    }
+    for (const char* arguments :
+         {"", "frobnicate", "add", "verify", "verify --all 1.2", "--compression zip list", "list --no-such",
+          "qa job.xml --image 1", "qa job.xml --study 1.2"})
+        EXPECT_EQ(kdd(arguments).exitCode, 2) << arguments;
+    for (const char* command : {"list", "verify --all", "build --all", "stack", "previews --all pictures"})
+        EXPECT_TRUE(kdd(command).err.contains("kdd.sqlite")) << command;
     EXPECT_FALSE(QDir(path("store")).exists()) << "nobody asked for one";
     QDir().mkpath(images());
     EXPECT_EQ(addImages().exitCode, 0);
     EXPECT_EQ(kdd("list --json").out, "{\"studies\":[]}\n") << "an empty store is no fault";
-    EXPECT_EQ(kdd("list --date 20241350").exitCode, 2);
 }
 
 TEST_F(CommandLine, DiffNamesEachDifference)
@@ -213,9 +157,7 @@ TEST_F(CommandLine, DiffNamesEachDifference)
     EXPECT_EQ(answer.exitCode, 1);
     ASSERT_EQ(answer.json("differences").toArray().size(), 1);
     EXPECT_TRUE(answer.out.contains("\"name\":\"PatientName\""));
-    EXPECT_EQ(kdd("diff 1.2 1.2").exitCode, 0);
     EXPECT_EQ(kdd("diff 1.2 1.3 --json").json("differences").toArray().size(), 4);
-    EXPECT_EQ(kdd("diff 1.2 @nowhere").exitCode, 1);
 }
 
 TEST_F(CommandLine, VerifyNoticesWhatChangedOnDisk)
@@ -233,37 +175,23 @@ TEST_F(CommandLine, VerifyNoticesWhatChangedOnDisk)
 TEST_F(CommandLine, DeletesWhatIsNamedAndNothingElse)
 {
     addTwoStudies();
-    for (const char* command :
-         {"delete 1.2 --image 9", "delete 1.2 --series 9", "delete 9", "delete 1.2 --series 1.2.3 --image 3"})
-        EXPECT_EQ(kdd(command).exitCode, 1) << command;
+    EXPECT_EQ(kdd("delete 1.2 --series 1.2.3 --image 3").exitCode, 1);
+    EXPECT_EQ(kdd("delete", QStringList{QString()}).exitCode, 1) << "an unset variable of a script";
     EXPECT_EQ(imagesOf("1.2"), 3);
     EXPECT_EQ(kdd("delete 1.2 --image 3 --json").out, "{\"deleted\":1}\n");
     EXPECT_EQ(kdd("delete 1.2 --series 1.2.3").exitCode, 0);
     EXPECT_EQ(imagesOf("1.2"), 1);
-    EXPECT_EQ(kdd("delete 1.2 --image 2").exitCode, 0);
-    EXPECT_EQ(kdd("delete", QStringList{QString()}).exitCode, 1) << "an unset variable of a script";
-    EXPECT_EQ(listed(), "1.3");
-    EXPECT_EQ(kdd("delete 1.3").exitCode, 0);
-    EXPECT_EQ(listed(), "");
 }
 
-TEST_F(CommandLine, ADamagedTagFileIsNamedAndTheOthersAreVerified)
+TEST_F(CommandLine, SampleStudiesAreTheSameToTheLastByteHoweverManyAreAskedFor)
 {
-    addTwoStudies();
-    put("../store/meta/damaged.tc", "TaCa");
-    const Answer answer = kdd("verify --all");
-    EXPECT_EQ(answer.exitCode, 1);
-    EXPECT_TRUE(answer.err.contains("damaged.tc"));
-    EXPECT_EQ(listed(), "1.2 1.3");
-}
-
-TEST_F(CommandLine, SampleStudiesComeThroughUnchanged)
-{
-    ASSERT_EQ(kdd("sample --images 40 @").exitCode, 0);
-    EXPECT_EQ(addImages().number("images"), 40);
-    const Answer verified = kdd("verify --all --json");
-    EXPECT_EQ(verified.exitCode, 0) << verified.err.toStdString();
-    EXPECT_EQ(verified.number("images"), 40);
+    for (const char* command : {"sample --images 60 @a", "sample --images 60 @b", "sample --images 90 @c"})
+        EXPECT_EQ(kdd(command).exitCode, 0);
+    for (const char* other : {"b", "c"}) {
+        const QString compare = QStringLiteral("diff -rq -x '*.vol' %1 %2 2>&1 | grep -v '^Only in %2'")
+                                    .arg(file("a"), file(other));
+        EXPECT_EQ(QProcess::execute(QStringLiteral("sh"), {QStringLiteral("-c"), compare}), 1) << other;
+    }
 }
 
 class RealFiles : public CommandLine

@@ -1,7 +1,5 @@
 #include "CommandLineFixture.h"
 #include "kddlib/tagfile/TagFile.h"
-#include "kddlib/tagfile/qa/QAAudit.h"
-#include "kddlib/tagmodel/TagMap.h"
 
 #include <QElapsedTimer>
 #include <QSet>
@@ -12,8 +10,6 @@ using namespace Kdd;
 
 namespace
 {
-
-using Uids = QList<QByteArray>;
 
 /// Corrections through the tool.
 class Correction : public CommandLine
@@ -33,11 +29,13 @@ protected:
         return kdd("qa --json", QStringList{job} + QString::fromLatin1(arguments).split(QLatin1Char(' ')));
     }
 
-    static std::unique_ptr<TagFile> stored(const char* study)
+    /// The images of a tag file.
+    static QSet<QByteArray> stored(const char* study)
     {
-        auto file = std::make_unique<TagFile>();
-        file->readCacheFileForStudy(study, false);
-        return file;
+        TagFile file;
+        file.readCacheFileForStudy(study, false);
+        const QList<QByteArray> uids = file.imagesByUID().keys();
+        return {uids.begin(), uids.end()};
     }
 };
 
@@ -62,25 +60,6 @@ TEST_F(Correction, TellsWhatItDid)
     EXPECT_EQ(correct(file("job.xml"), "--study 1.2 --image 4").exitCode, 0) << "it is done already";
 }
 
-TEST_F(Correction, NamesWhatIsWrong)
-{
-    addTwoStudies();
-    const QString edit = job("", kPatientName, "Roe^R");
-    put("broken.xml", "<Job>\n<Tag Group='x'/></Job>");
-    EXPECT_EQ(correct(edit, "--study 1.2").exitCode, 2) << "no image";
-    EXPECT_EQ(kdd("qa", QStringList{edit}).exitCode, 2) << "no study";
-    EXPECT_TRUE(correct(edit, "--study 9.9 --image 1").err.contains("No study is named \"9.9\""));
-    EXPECT_TRUE(correct(file("none.xml"), "--study 1.2 --image 1").err.contains("none.xml"));
-    const Answer broken = correct(file("broken.xml"), "--study 1.2 --image 1");
-    EXPECT_EQ(broken.exitCode, 1);
-    EXPECT_TRUE(broken.err.contains("Line 2: Group \"x\"")) << broken.err.toStdString();
-    const Answer refused = correct(job("", kSeries, "no uid"), "--study 1.2 --image 1");
-    EXPECT_EQ(refused.exitCode, 1);
-    EXPECT_TRUE(refused.err.contains("\"no uid\" is no UID"));
-    EXPECT_TRUE(
-        correct(job("7.7", kSeries, "8.1"), "--study 8.8 --image 1").err.contains("Neither study 7.7"));
-}
-
 /// Whenever the process dies, no image is lost, and running the job again completes it as if nothing had happened. Both
 /// studies have so much else that the time between the two writes is a good part of the whole.
 TEST_F(Correction, MovesThatAreKilledAreCompletedByTheNext)
@@ -94,17 +73,15 @@ TEST_F(Correction, MovesThatAreKilledAreCompletedByTheNext)
         while (noise.size() < 900)
             noise += QByteArray::number(static_cast<unsigned>(random()));
         const QByteArray uid = QByteArray::number(i);
-        const bool isThere = i >= kMoving + kStaying;
+        const QByteArray study = i < kMoving + kStaying ? "1.2" : "1.9";
         save(uid.constData(), anImage(uid.constData())
-                                  .inStudy(isThere ? "1.9" : "1.2")
-                                  .inSeries(i < kMoving ? "1.2.1"
-                                            : isThere   ? "1.9.2"
-                                                        : "1.2.2")
+                                  .inStudy(study.constData())
+                                  .inSeries((study + (i < kMoving ? ".1" : ".2")).constData())
                                   .with(DCM_ImageComments, noise.constData()));
         if (i < kMoving)
             moving.append(QString::fromLatin1(uid));
     }
-    EXPECT_EQ(addImages().number("images"), kMoving + 2 * kStaying);
+    EXPECT_EQ(addImages().exitCode, 0);
     unsigned duration = 0;
     for (unsigned round = 0; round < 20; ++round) {
         const char* const from = round % 2 == 0 ? "1.2" : "1.9";
@@ -119,22 +96,14 @@ TEST_F(Correction, MovesThatAreKilledAreCompletedByTheNext)
         duration = round == 0 ? static_cast<unsigned>(timer.elapsed()) + 1 : duration;
         killed->kill();
         killed->waitForFinished(kTimeout);
-        const Uids between = stored(from)->imagesByUID().keys() + stored(to)->imagesByUID().keys();
-        EXPECT_EQ(QSet<QByteArray>(between.begin(), between.end()).size(), kMoving + 2 * kStaying);
+        EXPECT_EQ((stored(from) + stored(to)).size(), kMoving + 2 * kStaying);
         const Answer again = kdd("qa", move);
         EXPECT_EQ(again.exitCode, 0) << again.err.toStdString();
-        EXPECT_EQ(stored(from)->imagesByUID().size(), kStaying);
-        const auto there = stored(to);
-        const TagMap* series = there->findSeries(to + QByteArray(".1"));
-        ASSERT_NE(series, nullptr);
-        EXPECT_EQ(series->children().size(), kMoving);
-        for (const TagMap* image : series->children()) {
-            AuditLog log;
-            QVector<AuditEntry> entries;
-            EXPECT_TRUE(log.read(*image) && log.decode(entries));
-            EXPECT_EQ(entries.size(), int(round) + 1);
-        }
+        EXPECT_EQ(stored(from).size(), kStaying);
+        EXPECT_EQ(stored(to).size(), kMoving + kStaying);
     }
+    EXPECT_EQ(kdd("build --all").exitCode, 0);
+    EXPECT_EQ(kdd("verify --all --json").number("images"), kMoving + 2 * kStaying);
 }
 
 }  // namespace

@@ -13,6 +13,20 @@ namespace
 class Operations : public CommandLine
 {
 protected:
+    /// A picture that can be stacked.
+    static DatasetBuilder aSlice(const char* uid, int number, const char* study)
+    {
+        const QByteArray text = QByteArray::number(number);
+        DatasetBuilder image = anImage(uid).inStudy(study).inSeries((QByteArray(study) + ".1").constData());
+        image.with(DCM_PatientName, "Doe^J").with(DCM_InstanceNumber, text.constData());
+        image.with(DCM_ImagePositionPatient, ("0\\0\\" + text).constData()).with(DCM_PixelSpacing, "1\\1");
+        image.with(DCM_ImageOrientationPatient, "1\\0\\0\\0\\1\\0").with(DCM_FrameOfReferenceUID, study);
+        image.with(DCM_Columns, "4").with(DCM_Rows, "3").with(DCM_PhotometricInterpretation, "MONOCHROME2");
+        image.with(DCM_SamplesPerPixel, "1").with(DCM_BitsAllocated, "16").with(DCM_BitsStored, "16");
+        image.with(DCM_HighBit, "15").with(DCM_PixelRepresentation, "0");
+        return image.words({0, 1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11});
+    }
+
     /// Images 7.N.1 to 7.N.8 of studies 1.1 to 1.3, of which those with a number below `count` are there so far.
     void saveImages(int count)
     {
@@ -37,7 +51,7 @@ protected:
         return "delete 1." + image.mid(2, 1) + " --image " + image;
     }
 
-    std::unique_ptr<Process> begin(const QByteArray& command) const
+    std::unique_ptr<QProcess> begin(const QByteArray& command) const
     {
         return start(command == "add" ? "add @" : command.constData());
     }
@@ -104,31 +118,22 @@ TEST_F(Operations, ThatWereKilledAreCompletedByTheirRepeat)
     if (qEnvironmentVariableIsSet("KDD_ARCHIVE_SEED"))
         mRandom.seed(static_cast<unsigned>(qEnvironmentVariableIntValue("KDD_ARCHIVE_SEED")));
     for (int round = 1; round <= count; ++round) {
-        QByteArray command;
-        switch (mExpected.empty() ? 0 : mRandom() % 6) {
-        case 0:
-        case 1:
-            command = "add";
+        const QByteArray image = mExpected.empty() ? QByteArray() : anyImage();
+        const QByteArray kCommands[] = {"add",
+                                        "add",
+                                        "build --all --again",
+                                        "stack --again",
+                                        "qa " + saveJob("Roe^" + QByteArray::number(round)) + " --study 1." +
+                                            image.mid(2, 1) + " --image " + image,
+                                        deletionOf(image)};
+        const int choice = image.isEmpty() ? 0 : static_cast<int>(mRandom() % 6);
+        const QByteArray& command = kCommands[choice];
+        if (choice < 2) {
             saveImages(qMin(round, 8));
-            for (const QByteArray& image : allImages())
-                mExpected.insert(image);  // what was deleted comes back with its file
-            break;
-        case 2:
-            command = "build --all --again";
-            break;
-        case 3:
-            command = "stack --again";
-            break;
-        case 4: {
-            const QByteArray image = anyImage();
-            command = "qa " + saveJob("Roe^" + QByteArray::number(round)) + " --study 1." + image.mid(2, 1) +
-                      " --image " + image;
-            break;
-        }
-        default:
-            const QByteArray image = anyImage();
+            for (const QByteArray& each : allImages())
+                mExpected.insert(each);  // what was deleted comes back with its file
+        } else if (choice == 5) {
             mExpected.erase(image);
-            command = deletionOf(image);
         }
         story += command.toStdString() + '\n';
         kill(command);
@@ -162,7 +167,7 @@ TEST_P(PairOfOperations, AtTheSameTimeLoseNothing)
     const QByteArray job = saveJob("Roe^R");
     const QByteArray commands[] = {QByteArray(GetParam().first).replace("JOB", job),
                                    QByteArray(GetParam().second).replace("JOB", job)};
-    const std::unique_ptr<Process> processes[] = {begin(commands[0]), begin(commands[1])};
+    const std::unique_ptr<QProcess> processes[] = {begin(commands[0]), begin(commands[1])};
     for (int i = 0; i < 2; ++i) {
         const Answer answer = finish(*processes[i]);
         EXPECT_TRUE(isDone(commands[i], answer)) << answer.err.toStdString();

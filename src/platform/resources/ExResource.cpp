@@ -35,12 +35,29 @@ constexpr Setting kCloudToken = {"KDD_CLOUD_TOKEN", "cloud/token", "https://oaut
 constexpr Setting kDatabase = {"KDD_DATABASE", "database/address", ""};
 constexpr Setting kMetaFolder = {"KDD_META_FOLDER", "folders/meta", ""};
 constexpr Setting kFileCacheFolder = {"KDD_FILE_CACHE", "folders/filecache", ""};
+constexpr Setting kAnswersFolder = {"KDD_ANSWERS", "folders/answers", ""};
+constexpr Setting kAnswersSize = {"KDD_ANSWERS_SIZE", "folders/answerssize", "1024"};
 constexpr Setting kTlsVerify = {"KDD_TLS_VERIFY", "tls/verify", "0"};
 constexpr Setting kTlsCaFile = {"KDD_TLS_CA_FILE", "tls/cafile", ""};
 constexpr Setting kSettleSeconds = {"KDD_SETTLE_SECONDS", "archive/settleseconds", "300"};
 constexpr Setting kReadPatience = {"KDD_READ_PATIENCE", "tagfiles/readpatience", "2000"};
 constexpr Setting kSessionHosts = {"KDD_SESSION_HOSTS", "web/sessionhosts", ""};
 constexpr Setting kShareConnections = {"KDD_SHARE_CONNECTIONS", "web/shareconnections", "0"};
+constexpr Setting kServerListen = {"KDD_SERVER_LISTEN", "server/listen", "127.0.0.1:8042"};
+constexpr Setting kServerStatus = {"KDD_SERVER_STATUS", "server/status", ""};
+constexpr Setting kServerPrefix = {"KDD_SERVER_PREFIX", "server/prefix", "/dicom-web"};
+constexpr Setting kServerCertificate = {"KDD_SERVER_CERTIFICATE", "server/certificate", ""};
+constexpr Setting kServerKey = {"KDD_SERVER_KEY", "server/key", ""};
+constexpr Setting kServerViewer = {"KDD_SERVER_VIEWER", "server/viewer", ""};
+constexpr Setting kServerPublic = {"KDD_SERVER_PUBLIC", "server/public", ""};
+constexpr Setting kServerHosts = {"KDD_SERVER_HOSTS", "server/hosts", ""};
+constexpr Setting kServerProxies = {"KDD_SERVER_PROXIES", "server/proxies", ""};
+constexpr Setting kServerThreads = {"KDD_SERVER_THREADS", "server/threads", "0"};
+constexpr Setting kServerConnections = {"KDD_SERVER_CONNECTIONS", "server/connections", "10000"};
+constexpr Setting kServerRequests = {"KDD_SERVER_REQUESTS", "server/requests", "256"};
+constexpr Setting kServerPatience = {"KDD_SERVER_PATIENCE", "server/patience", "30"};
+constexpr Setting kServerStop = {"KDD_SERVER_STOP", "server/stop", "30"};
+constexpr Setting kServerSlow = {"KDD_SERVER_SLOW", "server/slow", "2000"};
 
 using Values = QHash<QString, QByteArray>;
 
@@ -97,16 +114,16 @@ QByteArray endpoint(const Setting& setting)
     return address.endsWith('/') ? address : address + '/';
 }
 
-/// Of 0 to `most`; of anything else the standard, for a site's slip should not stop its server.
-int numberOf(const Setting& setting, int most)
+/// Of `least` to `most`; of anything else the standard, for a site's slip should not stop its server.
+int numberOf(const Setting& setting, int least, int most)
 {
     const QByteArray text = valueOf(setting);
     bool isNumber = false;
     const int number = text.toInt(&isNumber);
-    if (isNumber && number >= 0 && number <= most)
+    if (isNumber && number >= least && number <= most)
         return number;
-    LogFile::warnf("%s is \"%s\", which is no number of 0 to %d; %s is taken", setting.variable,
-                   text.constData(), most, setting.standard);
+    LogFile::warnf("%s is \"%s\", which is no number of %d to %d; %s is taken", setting.variable,
+                   text.constData(), least, most, setting.standard);
     return QByteArray(setting.standard).toInt();
 }
 
@@ -152,6 +169,16 @@ QByteArray ExResource::fileCacheFolder()
     return valueOf(kFileCacheFolder);
 }
 
+QByteArray ExResource::answersFolder()
+{
+    return valueOf(kAnswersFolder);
+}
+
+int ExResource::answersSize()
+{
+    return numberOf(kAnswersSize, 0, 1024 * 1024);
+}
+
 bool ExResource::verifiesTls()
 {
     return valueOf(kTlsVerify) != "0";
@@ -165,7 +192,7 @@ QByteArray ExResource::tlsCaFile()
 int ExResource::readPatience()
 {
     // Ten minutes [ms].
-    return numberOf(kReadPatience, 600000);
+    return numberOf(kReadPatience, 0, 600000);
 }
 
 QByteArray ExResource::sessionHosts()
@@ -175,12 +202,87 @@ QByteArray ExResource::sessionHosts()
 
 int ExResource::settleSeconds()
 {
-    return numberOf(kSettleSeconds, std::numeric_limits<int>::max());
+    return numberOf(kSettleSeconds, 0, std::numeric_limits<int>::max());
 }
 
 bool ExResource::sharesConnections()
 {
     return valueOf(kShareConnections) == "1";
+}
+
+QByteArray ExResource::serverListen()
+{
+    return valueOf(kServerListen);
+}
+
+QByteArray ExResource::serverStatus()
+{
+    return valueOf(kServerStatus);
+}
+
+QByteArray ExResource::serverPrefix()
+{
+    return valueOf(kServerPrefix);
+}
+
+QByteArray ExResource::serverCertificate()
+{
+    return valueOf(kServerCertificate);
+}
+
+QByteArray ExResource::serverKey()
+{
+    return valueOf(kServerKey);
+}
+
+QByteArray ExResource::serverViewer()
+{
+    return valueOf(kServerViewer);
+}
+
+QByteArray ExResource::serverPublicAddress()
+{
+    return valueOf(kServerPublic);
+}
+
+QByteArray ExResource::serverHosts()
+{
+    return valueOf(kServerHosts);
+}
+
+QByteArray ExResource::serverProxies()
+{
+    return valueOf(kServerProxies);
+}
+
+int ExResource::serverThreads()
+{
+    return numberOf(kServerThreads, 0, 1000);
+}
+
+int ExResource::serverConnections()
+{
+    return numberOf(kServerConnections, 1, 1000000);
+}
+
+int ExResource::serverRequests()
+{
+    return numberOf(kServerRequests, 1, 100000);
+}
+
+int ExResource::serverPatience()
+{
+    return numberOf(kServerPatience, 1, 3600);
+}
+
+int ExResource::serverStop()
+{
+    return numberOf(kServerStop, 0, 3600);
+}
+
+int ExResource::serverSlow()
+{
+    return numberOf(kServerSlow, 0, std::numeric_limits<int>::max());
 }
 
 }  // namespace Kdd

@@ -44,6 +44,13 @@ public:
     /// Folder of the file cache. KDD_FILE_CACHE, folders/filecache, empty: there is no file cache.
     static QByteArray fileCacheFolder();
 
+    /// Folder of the answers that `kdd serve` keeps ready. KDD_ANSWERS, folders/answers, empty: "answers" in the folder of
+    /// the tag files.
+    static QByteArray answersFolder();
+
+    /// How much of it may stay used [MiB], 0 to 1048576; 0: none is kept. KDD_ANSWERS_SIZE, folders/answerssize, "1024".
+    static int answersSize();
+
     /// Whether servers must prove who they are when they are reached over TLS: not when the value is 0, so that a
     /// misspelt one errs on the safe side. KDD_TLS_VERIFY, tls/verify, "0".
     static bool verifiesTls();
@@ -67,6 +74,54 @@ public:
     /// Whether all threads use one set of connections, which libcurl does not support and which ends the process under
     /// load: only when the value is 1. KDD_SHARE_CONNECTIONS, web/shareconnections, "0".
     static bool sharesConnections();
+
+    // What `kdd serve` does when its options do not say it.
+
+    /// Where it waits for requests, ADDRESS:PORT. KDD_SERVER_LISTEN, server/listen, "127.0.0.1:8042".
+    static QByteArray serverListen();
+
+    /// Where it answers those who watch it, ADDRESS:PORT. KDD_SERVER_STATUS, server/status, empty: nowhere.
+    static QByteArray serverStatus();
+
+    /// What the paths of DICOMweb begin with. KDD_SERVER_PREFIX, server/prefix, "/dicom-web".
+    static QByteArray serverPrefix();
+
+    /// Files with certificate and key, in PEM. KDD_SERVER_CERTIFICATE and KDD_SERVER_KEY, server/certificate and
+    /// server/key, empty: no TLS.
+    static QByteArray serverCertificate();
+    static QByteArray serverKey();
+
+    /// Folder of a viewer's files. KDD_SERVER_VIEWER, server/viewer, empty: no viewer.
+    static QByteArray serverViewer();
+
+    /// The address under which clients reach it. KDD_SERVER_PUBLIC, server/public, empty: the one that they ask.
+    static QByteArray serverPublicAddress();
+
+    /// Further names by which it may be asked, separated by commas or blanks. KDD_SERVER_HOSTS, server/hosts, empty.
+    static QByteArray serverHosts();
+
+    /// Numeric addresses of the proxies that may say how a client reached them, separated by commas or blanks.
+    /// KDD_SERVER_PROXIES, server/proxies, empty.
+    static QByteArray serverProxies();
+
+    /// Threads that answer, up to 1,000. KDD_SERVER_THREADS, server/threads, "0": as many as suit the machine.
+    static int serverThreads();
+
+    /// Connections at a time, 1 to 1,000,000. KDD_SERVER_CONNECTIONS, server/connections, "10000".
+    static int serverConnections();
+
+    /// Requests that are answered or wait for a thread, 1 to 100,000. KDD_SERVER_REQUESTS, server/requests, "256".
+    static int serverRequests();
+
+    /// How long it waits for a request to come whole, and for a client to take more of an answer [s], 1 to 3,600.
+    /// KDD_SERVER_PATIENCE, server/patience, "30".
+    static int serverPatience();
+
+    /// How long requests may go on when it stops [s], up to 3,600. KDD_SERVER_STOP, server/stop, "30".
+    static int serverStop();
+
+    /// Requests that take longer [ms] are told in the log. KDD_SERVER_SLOW, server/slow, "2000".
+    static int serverSlow();
 };
 
 }  // namespace Kdd

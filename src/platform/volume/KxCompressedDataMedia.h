@@ -9,7 +9,7 @@
 namespace Kdd
 {
 
-/// Bytes of a video, wherever they are. Used by one thread at a time.
+/// Bytes of a file or a video, wherever they are. Used by one thread at a time.
 class KDD_EXPORT MediaSource
 {
 public:

@@ -79,19 +79,21 @@ bool isInverted(DcmDataset& dataset)
            textOf(dataset, DCM_PresentationLUTShape) == "INVERSE";
 }
 
-Info showFrame(DcmDataset& dataset, int width, int height, Result& result)
+Info showFrame(DcmDataset& dataset, const FrameView& asked, Result& result)
 {
-    int number = 0;
+    FrameView view = asked;
     StoredFrame frame;
     // By the larger of the two, since a codec halves both sides at once and neither may fall below.
-    result = readRepresentative(dataset, qMax(width, height), number, frame);
+    const int least = qMax(view.width, view.height);
+    result = view.frame == FrameView::kRepresentative ? readRepresentative(dataset, least, view.frame, frame)
+                                                      : readStoredFrame(dataset, view.frame, least, frame);
     if (result.bad())
         return nullptr;
-    const double aspect = pixelAspect(ImageAttributes(dataset, number));
+    const double aspect = pixelAspect(ImageAttributes(dataset, view.frame));
     if (frame.colour == StoredFrame::Colour::Grey)
-        return infoOf(showGrey(dataset, number, frame, width, height), aspect, isInverted(dataset));
+        return infoOf(showGrey(dataset, view, frame), aspect, isInverted(dataset));
     ShownPixels shown;
-    result = showColour(dataset, frame, width, height, shown);
+    result = showColour(dataset, frame, view.width, view.height, shown);
     return result.good() ? infoOf(shown, aspect, false) : nullptr;
 }
 
@@ -123,8 +125,23 @@ Info KxVolumeInfo::readVolumeInfo(DcmDataset* dataset, int width, int height, co
         result = Result::failure(QStringLiteral("There is no dataset")).within(path);
         return nullptr;
     }
-    DcmPixelSequence* video = findVideo(*dataset);
-    Info info = video ? showVideo(*video, width, height, result) : showFrame(*dataset, width, height, result);
+    FrameView view;
+    view.width = width;
+    view.height = height;
+    return readVolumeInfo(*dataset, view, path, result);
+}
+
+Info KxVolumeInfo::readVolumeInfo(DcmDataset& dataset, const FrameView& view, const QString& path,
+                                  Result& result)
+{
+    DcmPixelSequence* video = findVideo(dataset);
+    Info info;
+    if (video == nullptr)
+        info = showFrame(dataset, view, result);
+    else if (view.frame == FrameView::kRepresentative)
+        info = showVideo(*video, view.width, view.height, result);
+    else
+        result = Result::failure(QStringLiteral("A frame of a video does not stand alone"));
     result = result.within(path);
     return info;
 }

@@ -3,6 +3,7 @@
 #include "platform/base/Export.h"
 #include "platform/base/Result.h"
 #include "platform/base/TypedData2D.h"
+#include "platform/volume/FrameView.h"
 
 #include <QByteArray>
 #include <QString>
@@ -36,6 +37,11 @@ public:
     ///
     /// Null, and `result` says why, when there is nothing to show.
     static std::shared_ptr<KxVolumeInfo> readVolumeInfo(DcmDataset* dataset, int width, int height,
+                                                        const QString& path, Result& result);
+
+    /// The same of the frame that `view` names, with its window. Failure also: there is no such frame, or the image is a
+    /// video, of which no frame stands alone, and one was named.
+    static std::shared_ptr<KxVolumeInfo> readVolumeInfo(DcmDataset& dataset, const FrameView& view,
                                                         const QString& path, Result& result);
 
     /// One slice of a volume file; the window is the file's own ("WindowCenter", "WindowWidth"), else the range of the

@@ -64,12 +64,6 @@ bool mayShareChroma(const FrameLayout& layout)
     return is422 && layout.samples == 3 && !layout.isPlanar && !layout.isFloat && layout.columns % 2 == 0;
 }
 
-/// Some writers declare shared chroma but store all of it; the length tells.
-bool sharesChroma(const FrameLayout& layout, qint64 length)
-{
-    return mayShareChroma(layout) && length * 8 / nativeFrameBits(layout, false) < layout.frames;
-}
-
 /// Wide pixels come as words: the order within a word is the machine's by now, that of the words is still the file's.
 void swapWords(QByteArray& bytes)
 {
@@ -84,6 +78,11 @@ qint64 nativeFrameBits(const FrameLayout& layout, bool sharesChroma)
     // Two pixels take four values in place of six.
     const qint64 values = sharesChroma ? layout.numValues() / 3 * 2 : layout.numValues();
     return values * layout.bitsAllocated;
+}
+
+bool sharesChroma(const FrameLayout& layout, qint64 length)
+{
+    return mayShareChroma(layout) && length * 8 / nativeFrameBits(layout, false) < layout.frames;
 }
 
 TypedData2D unpackFrame(const QByteArray& bytes, const FrameLayout& layout, int firstBit, bool sharesChroma)

@@ -1,6 +1,7 @@
 #include "platform/volume/BlockAverage.h"
 #include "platform/volume/ImageAttributes.h"
 #include "platform/volume/LookupTable.h"
+#include "platform/volume/PixelTypes.h"
 #include "platform/volume/ShownPixels.h"
 #include "platform/volume/StoredFrame.h"
 
@@ -8,6 +9,7 @@
 #include <dcmtk/dcmdata/dcitem.h>
 
 #include <algorithm>
+#include <cmath>
 
 namespace Kdd
 {
@@ -97,11 +99,41 @@ ValueRange paddingOf(const ImageAttributes& attributes, PrimitiveType type)
     return paddingOf(attributes, DCM_PixelPaddingValue, DCM_PixelPaddingRangeLimit, type);
 }
 
+/// From 0, black, to 1, white.
+double shownBy(const FrameWindow& window, double value)
+{
+    // Of one step: a threshold.
+    constexpr double kLeastWidth = 1e-6;
+    switch (window.function) {
+    case FrameWindow::Function::Linear:
+        return (value - (window.center - 0.5)) / qMax(window.width - 1, kLeastWidth) + 0.5;
+    case FrameWindow::Function::LinearExact:
+        return (value - window.center) / window.width + 0.5;
+    case FrameWindow::Function::Sigmoid:
+        break;
+    }
+    return 1 / (1 + std::exp(-4 * (value - window.center) / window.width));
+}
+
+/// The picture as the window has it; the functions say what black and white are to a half of a step.
+ShownPixels spreadBy(const FrameWindow& window, const TypedData2D& pixels)
+{
+    ShownPixels shown{pixels, {0, 1}};
+    shown.pixels.type = PrimitiveType::Float32;
+    allocatePixels(shown.pixels);
+    visitPixelType(pixels.type, [&](auto zero) {
+        const auto* values = valuesOf<decltype(zero)>(pixels);
+        std::transform(values, values + numValues(pixels), valuesOf<float>(shown.pixels),
+                       [&](auto value) { return toFloat(shownBy(window, double(value))); });
+    });
+    return shown;
+}
+
 }  // namespace
 
-ShownPixels showGrey(DcmItem& dataset, int frame, const StoredFrame& stored, int width, int height)
+ShownPixels showGrey(DcmItem& dataset, const FrameView& view, const StoredFrame& stored)
 {
-    const ImageAttributes attributes(dataset, frame);
+    const ImageAttributes attributes(dataset, view.frame);
     const PrimitiveType type = stored.pixels.type;
     Rescale rescale = rescaleOf(attributes);
     ShownPixels shown{stored.pixels, rangeOf(stored.pixels, paddingOf(attributes, type))};
@@ -115,20 +147,21 @@ ShownPixels showGrey(DcmItem& dataset, int frame, const StoredFrame& stored, int
 
     shown.range = shown.range.scaled(rescale.slope, rescale.intercept);
     const ValueRange window = windowOf(attributes);
-    const bool hasWindow = window.overlaps(shown.range);
+    const bool hasWindow = view.window || window.overlaps(shown.range);
     // It is looked up in after the rescale, so it is signed when those values reach below zero.
     const LookupTable voi =
         tableOf(attributes, DCM_FrameVOILUTSequence, DCM_VOILUTSequence, shown.range.lowest < 0);
     if (!hasWindow && !voi.isEmpty())
-        return reduce({voi.appliedTo(shown.pixels, rescale.slope, rescale.intercept), voi.range()}, width,
-                      height);
+        return reduce({voi.appliedTo(shown.pixels, rescale.slope, rescale.intercept), voi.range()},
+                      view.width, view.height);
     // A window that shows none of the values was made for others, so it would show a black or a white image.
-    if (hasWindow)
+    if (hasWindow && !view.window)
         shown.range = window;
     // Averaging and rescaling may change places, as both are linear; this way only the small picture is rescaled.
     const ValueRange storedRange = shown.range.scaled(1 / rescale.slope, -rescale.intercept / rescale.slope);
-    const ShownPixels reduced = reduce({shown.pixels, storedRange}, width, height);
-    return {scaleValues(reduced.pixels, rescale.slope, rescale.intercept), shown.range};
+    const ShownPixels reduced = reduce({shown.pixels, storedRange}, view.width, view.height);
+    const TypedData2D values = scaleValues(reduced.pixels, rescale.slope, rescale.intercept);
+    return view.window ? spreadBy(*view.window, values) : ShownPixels{values, shown.range};
 }
 
 }  // namespace Kdd

@@ -2,6 +2,7 @@
 
 #include "platform/base/Result.h"
 #include "platform/base/TypedData2D.h"
+#include "platform/volume/FrameView.h"
 #include "platform/volume/ValueRange.h"
 
 class DcmItem;
@@ -18,9 +19,10 @@ struct ShownPixels
     ValueRange range;
 };
 
-/// A grey frame: the modality table or rescale applied, reduced to about `width` x `height`, with the range of its
-/// window, else its VOI table applied, else the range of its pixels without padding.
-ShownPixels showGrey(DcmItem& dataset, int frame, const StoredFrame& stored, int width, int height);
+/// A grey frame (`view.frame`): the modality table or rescale applied, reduced to about the size wanted, with the window
+/// that is asked for, else the range of its own one, else its VOI table applied, else the range of its pixels without
+/// padding.
+ShownPixels showGrey(DcmItem& dataset, const FrameView& view, const StoredFrame& stored);
 
 /// A colour frame as RGB, reduced. Failure: a palette that is missing or damaged.
 Result showColour(DcmItem& dataset, const StoredFrame& stored, int width, int height, ShownPixels& shown);

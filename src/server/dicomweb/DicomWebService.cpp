@@ -24,6 +24,14 @@ DicomWebService::DicomWebService(int prefixSegments, std::vector<std::unique_ptr
 {
 }
 
+Http::Request DicomWebService::below(const Http::Request& request) const
+{
+    Http::Request made = request;
+    for (const QByteArray& segment : request.path.mid(0, mPrefixSegments))
+        made.base += '/' + segment;
+    return made;
+}
+
 Http::Response DicomWebService::answer(const Http::Request& request)
 {
     ResourcePath path;
@@ -36,7 +44,7 @@ Http::Response DicomWebService::answer(const Http::Request& request)
             return methodsOnly(204);
         if (request.method != Http::Method::Get && request.method != Http::Method::Head)
             return methodsOnly(405);
-        return resource->answer(request, path);
+        return resource->answer(below(request), path);
     }
     return Http::failure(404, QStringLiteral("No resource has this path"));
 }

@@ -19,6 +19,8 @@ public:
     Http::Response answer(const Http::Request& request) override;
 
 private:
+    Http::Request below(const Http::Request& request) const;
+
     int mPrefixSegments;
     std::vector<std::unique_ptr<Resource>> mResources;
 };

@@ -15,7 +15,8 @@ public:
     /// Whether the path is this one's.
     virtual bool owns(const ResourcePath& path) const = 0;
 
-    /// The answer to GET (and HEAD) on a path that is owned.
+    /// The answer to GET (and HEAD) on a path that is owned. The request's base is the address of DICOMweb, with its
+    /// prefix: an object's is base + "/studies/1.2".
     virtual Http::Response answer(const Http::Request& request, const ResourcePath& path) = 0;
 };
 

@@ -13,9 +13,11 @@ constexpr int kLongestUID = 64;
 
 bool isUID(const QByteArray& text)
 {
-    return !text.isEmpty() && text.size() <= kLongestUID &&
-           std::all_of(text.begin(), text.end(),
-                       [](char each) { return each == '.' || (each >= '0' && each <= '9'); });
+    const auto isAllowed = [](char each) {
+        return (each >= '0' && each <= '9') || (each >= 'A' && each <= 'Z') || (each >= 'a' && each <= 'z') ||
+               each == '.' || each == '-' || each == '_';
+    };
+    return !text.isEmpty() && text.size() <= kLongestUID && std::all_of(text.begin(), text.end(), isAllowed);
 }
 
 bool ResourcePath::parse(const QVector<QByteArray>& segments, ResourcePath& path)

@@ -25,7 +25,8 @@ struct ResourcePath
     static bool parse(const QVector<QByteArray>& segments, ResourcePath& path);
 };
 
-/// Whether it can be a UID: digits and points, 1 to 64 of them.
+/// Whether it can stand for a UID: 1 to 64 characters. Digits and points make one, but archives hold others, with letters,
+/// "-" and "_", from software that hashed them.
 bool isUID(const QByteArray& text);
 
 }  // namespace Kdd::DicomWeb

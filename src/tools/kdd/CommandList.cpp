@@ -21,6 +21,7 @@ namespace Kdd
     DO(Diff)                                                                                                 \
     DO(Get)                                                                                                  \
     DO(Put)                                                                                                  \
+    DO(Serve)                                                                                                \
     DO(Sample)
 
 #define KDD_NAME(NAME) void declare##NAME(CommandSet& commands);

@@ -46,6 +46,7 @@ constexpr const char* kFile = "FILE";
 constexpr const char* kFolder = "DIR";
 constexpr const char* kPath = "PATH";  ///< file or folder
 constexpr const char* kUrl = "URL";
+constexpr const char* kListenAddress = "ADDRESS:PORT";
 constexpr const char* kStudyOrFile = "STUDY|FILE";
 constexpr const char* kStudiesAndFolder = "STUDY|DIR";
 
@@ -97,6 +98,7 @@ constexpr const char* kChanging = "Change what is stored";
 constexpr const char* kLooking = "Look at what is stored";
 constexpr const char* kChecking = "Check and compare";
 constexpr const char* kTransfers = "Transfer files";
+constexpr const char* kServing = "Serve what is stored";
 constexpr const char* kTrying = "Try it out";
 
 /// Where commands declare themselves.

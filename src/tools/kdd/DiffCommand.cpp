@@ -1,4 +1,4 @@
-#include "tools/kdd/AttributeDiff.h"
+#include "tools/kdd/AttributeText.h"
 #include "tools/kdd/Commands.h"
 #include "tools/kdd/Report.h"
 #include "tools/kdd/Store.h"
@@ -6,9 +6,11 @@
 #include <QFileInfo>
 #include <QJsonArray>
 
+#include <kddlib/AttributeDifference.h>
 #include <kddlib/DicomInput.h>
 #include <kddlib/LogFile.h>
 #include <kddlib/TagMap.h>
+#include <kddlib/TagSequence.h>
 
 #include <cstdio>
 #include <memory>
@@ -51,6 +53,38 @@ bool readNamed(const QString& name, TagFile& file)
         return file.addTagMap(input.map.release(), path.constData(), true) != nullptr;
     LogFile::errorf("Could not load %s: %s", qUtf8Printable(name), qUtf8Printable(input.reason));
     return false;
+}
+
+/// What is printed of a difference.
+struct DiffLine
+{
+    QByteArray path;  ///< "(0008,1140)[0].(0008,1150)"
+    QByteArray name;  ///< the dictionary's keyword; empty when it has none
+    QByteArray left;  ///< "UI [1.2.3]", or "-" where the node has no such attribute
+    QByteArray right;
+};
+
+/// The value as a difference shows it. Sequences and omitted values have none to show.
+QByteArray describe(const TagMap* node, const DcmTagKey& key)
+{
+    if (node == nullptr)
+        return "-";
+    const TagElement& element = *node->findElement(key);
+    if (element.isSequence())
+        return "SQ of " + QByteArray::number(static_cast<const TagSequence&>(element).numItems()) + " items";
+    if (element.markedAsOmitted())
+        return "omitted";
+    QByteArray text;
+    node->findAndGetString(key, text);
+    return QByteArray(vrName(element.vr())) + " [" + text + ']';
+}
+
+DiffLine lineOf(const AttributeDifference& difference)
+{
+    // A private name needs the creator, which stands where the attribute does.
+    const TagMap& named = difference.left != nullptr ? *difference.left : *difference.right;
+    return {difference.path + keyText(difference.key), keywordOf(named, difference.key),
+            describe(difference.left, difference.key), describe(difference.right, difference.key)};
 }
 
 class Comparison
@@ -97,10 +131,13 @@ public:
 private:
     void compareImages(const QByteArray& key, const TagMap& left, const TagMap& right)
     {
-        compareNodes(left, right, [&](const AttributeDifference& difference) { tell(key, difference); });
+        compareNodes(left, right, [&](const AttributeDifference& difference) {
+            tell(key, lineOf(difference));
+            return true;
+        });
     }
 
-    void tell(const QByteArray& image, const AttributeDifference& difference)
+    void tell(const QByteArray& image, const DiffLine& difference)
     {
         ++mCount;
         if (mOptions.json) {

@@ -30,10 +30,13 @@ Outcome runMetadata(const GlobalOptions& /*options*/, const NodeSelection& selec
     QList<const TagMap*> images;
     collectImages(*node, images);
     // Written image by image: as a whole the array may be many times as large as the study's tag file.
+    DicomImageWriter writer(MetadataForm::Json);
+    QByteArray text;
     const char* separator = "[\n";
     for (const TagMap* image : qAsConst(images)) {
-        std::cout << separator;
-        writeDicomJson(std::cout, *image, bulkDataRoot(*image));
+        text = separator;
+        writer.append(text, *image, QByteArray::fromStdString(bulkDataRoot(*image)));
+        std::cout.write(text.constData(), text.size());
         separator = ",\n";
     }
     // Without images it is an empty array, so that the result is valid in any case.

@@ -5,6 +5,16 @@
 namespace Kdd
 {
 
+namespace
+{
+
+bool isBelow(const std::string& path, const std::string& folder)
+{
+    return path.compare(0, folder.size() + 1, folder + '/') == 0;
+}
+
+}  // namespace
+
 std::string ArchiveModel::keyOf(const std::string& path, const ModelFile& file)
 {
     return file.sop.empty() ? path : file.sop;
@@ -35,8 +45,8 @@ std::vector<std::string> ArchiveModel::changedBelow(const std::string& folder) c
     std::vector<std::string> changed;
     for (const auto& file : mDisk) {
         const auto known = mRegistered.find(file.first);
-        const bool isBelow = file.first.compare(0, folder.size() + 1, folder + '/') == 0;
-        if (isBelow && (known == mRegistered.end() || known->second.version != mVersions.at(file.first)))
+        const bool isKnown = known != mRegistered.end() && known->second.version == mVersions.at(file.first);
+        if (isBelow(file.first, folder) && !isKnown)
             changed.push_back(file.first);
     }
     return changed;
@@ -73,28 +83,25 @@ bool ArchiveModel::add(const std::string& folder)
     const std::set<std::string> waitedBefore = mWaiting;
     const std::set<std::string> touched = registerAll(paths);
     mWaiting.insert(touched.begin(), touched.end());
+    const bool hasUnchanged = std::any_of(mDisk.begin(), mDisk.end(), [&](const auto& file) {
+        return isBelow(file.first, folder) &&
+               std::find(paths.begin(), paths.end(), file.first) == paths.end();
+    });
     bool isDone = true;
     for (const auto& study : arrivals)
         complete(study.first, study.second, waitedBefore.count(study.first) == 0, isDone);
+    std::set<std::string> left;
     for (const std::string& study : touched) {
         if (arrivals.count(study) == 0)
-            isDone = build(study) && isDone;
+            left.insert(study);
     }
     // What was found unchanged may be left of an intake that did not come to its end.
-    std::set<std::string> left;
     for (const auto& file : mRegistered) {
-        const bool isBelow = file.first.compare(0, folder.size() + 1, folder + '/') == 0;
-        if (isBelow && mWaiting.count(file.second.file.study) > 0)
+        if (hasUnchanged && isBelow(file.first, folder) && mWaiting.count(file.second.file.study) > 0)
             left.insert(file.second.file.study);
     }
-    const bool hasUnchanged = std::any_of(mDisk.begin(), mDisk.end(), [&](const auto& file) {
-        return file.first.compare(0, folder.size() + 1, folder + '/') == 0 &&
-               std::find(paths.begin(), paths.end(), file.first) == paths.end();
-    });
-    for (const std::string& study : left) {
-        if (hasUnchanged)
-            isDone = build(study) && isDone;
-    }
+    for (const std::string& study : left)
+        isDone = build(study) && isDone;
     return isDone;
 }
 

@@ -14,12 +14,12 @@
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/database/Kxg.h"
 #include "support/DatasetBuilder.h"
+#include "support/FileContent.h"
 #include "support/LogCapture.h"
 #include "support/TemporaryStore.h"
 
 #include <QDir>
 #include <QFile>
-#include <QFileInfo>
 
 #include <fcntl.h>
 #include <sys/stat.h>
@@ -185,9 +185,8 @@ protected:
     {
         const std::string study = pickStudy();
         const unsigned what = pick(5);
-        const std::string series = what == 1 ? study + '.' + std::to_string(pick(2)) : "";
-        const std::string image = what > 1 ? "9." + std::to_string(pick(10)) : "";
-        remove(study, series, image);
+        remove(study, what == 1 ? study + '.' + std::to_string(pick(2)) : "",
+               what > 1 ? "9." + std::to_string(pick(10)) : "");
     }
 
     void remove(const std::string& study, const std::string& series, const std::string& image)
@@ -233,11 +232,7 @@ protected:
         ModelStudy content;
     };
 
-    QByteArray bytesOf(const std::string& study) const
-    {
-        QFile file(tagFilePath(study));
-        return file.open(QIODevice::ReadOnly) ? file.readAll() : QByteArray();
-    }
+    QByteArray bytesOf(const std::string& study) const { return fileContent(tagFilePath(study)); }
 
     void spoil(const std::string& study)
     {
@@ -262,7 +257,7 @@ protected:
             if (other == study || mModel.tagFile(other) == nullptr)
                 return;
             tell("put the tag file of " + other + " in the place of " + study);
-            replace(study, bytesOf(other));
+            putFile(tagFilePath(study), bytesOf(other));
             mModel.spoil(study, nullptr, true);
             break;
         }
@@ -278,23 +273,15 @@ protected:
     void restore(const std::string& study)
     {
         tell("restore the old tag file of " + study);
-        replace(study, mCopies[study].bytes);
+        putFile(tagFilePath(study), mCopies[study].bytes);
         mModel.spoil(study, &mCopies[study].content, true);
     }
 
     void cut(const std::string& study, int length)
     {
         tell("cut the tag file of " + study);
-        replace(study, bytesOf(study).left(length));
+        putFile(tagFilePath(study), bytesOf(study).left(length));
         mModel.spoil(study, nullptr, true);
-    }
-
-    void replace(const std::string& study, const QByteArray& bytes)
-    {
-        QDir().mkpath(QFileInfo(tagFilePath(study)).path());
-        QFile file(tagFilePath(study));
-        expect(file.open(QIODevice::WriteOnly) && file.write(bytes) == bytes.size(),
-               "no tag file could be put");
     }
 
     LogCapture mLog;

@@ -5,16 +5,13 @@
 #include "platform/base/LogFile.h"
 #include "platform/os/ExclusiveFile.h"
 #include "support/LogCapture.h"
-#include "support/Threads.h"
 
 #include <QFile>
 
 #include <gtest/gtest.h>
 #include <syslog.h>
 
-#include <atomic>
 #include <cstdarg>
-#include <functional>
 #include <iostream>
 #include <vector>
 
@@ -33,9 +30,6 @@ namespace Kdd
 {
 namespace
 {
-
-constexpr int kThreads = 8;
-constexpr int kRounds = 10;
 
 class TagFileInterface : public CatalogueFixture
 {
@@ -141,41 +135,6 @@ TEST_F(TagFileInterface, NullsAndNegativeCountsAreRefusedWithALineEach)
     EXPECT_EQ(log.count(" must not be "), 12);
     EXPECT_EQ(log.lines().size(), 12U);
     EXPECT_EQ(imagesInFile("1.2").size(), 3);
-}
-
-/// How often the work answered true, done on all threads at once and on each again and again.
-int successes(const std::function<bool(int thread, int round)>& work)
-{
-    std::atomic<int> done = 0;
-    onThreads(kThreads, [&](int thread) {
-        for (int round = 0; round < kRounds; ++round)
-            done += work(thread, round) ? 1 : 0;
-    });
-    return done;
-}
-
-TEST_F(TagFileInterface, ThreadsWaitForEachOtherAndLoseNothing)
-{
-    const auto image = [](int thread, int round) { return QByteArray::number(thread * 100 + round); };
-    std::vector<QByteArray> images = {"kept"};
-    for (int i = 0; i < kThreads * kRounds; ++i)
-        images.push_back(image(i / kRounds, i % kRounds));
-    writeStudy("1.2", images);
-    registerImages("1.2", {"kept"});
-    // Whoever finds the file held for longer than it waits is told so.
-    const LogCapture log;
-    const int removals = successes([&](int thread, int round) {
-        const QByteArray uid = image(thread, round);
-        const char* own[] = {uid.constData()};
-        return DeleteImagesInTagFile("1.2", 1, own);
-    });
-    const int refused = log.count("Could not remove images from the tag file of study 1.2");
-    EXPECT_EQ(removals, kThreads * kRounds - refused);
-    EXPECT_EQ(imagesInFile("1.2").size(), 1 + refused);
-    EXPECT_EQ(successes([](int, int) { return isSynced("1.2"); }), kThreads * kRounds);
-    const int deletions = successes([](int, int) { return DeleteTagFile("1.2"); });
-    EXPECT_EQ(deletions, kThreads * kRounds - log.count("could not be deleted"));
-    EXPECT_FALSE(QFile::exists(path()));
 }
 
 /// In a process of its own, for the log is the process's.

@@ -48,15 +48,4 @@ TEST(ClientSettings, SendTheHeadersOfTheCloudOnlyWithAuthorization)
                                           "Host: storage.googleapis.com", "Cache-Control: no-transform"));
 }
 
-TEST(ClientSettings, MakeTheFirstRangeAtLeast1025BytesLong)
-{
-    ClientSettings settings;
-    settings.chunkSizeForPartialRequests = 100;
-    EXPECT_FALSE(firstRange(settings));
-    settings.numConcurrentRequestsPerFile = 2;
-    EXPECT_EQ(firstRange(settings)->last, 1024);
-    settings.chunkSizeForPartialRequests = 2000;
-    EXPECT_EQ(firstRange(settings, 5)->text(), "bytes=5-2004");
-}
-
 }  // namespace

@@ -1,9 +1,8 @@
 #include "kddlib/net/KxCurlClient.h"
 #include "kddlib/net/cloud/KxCurlUploadStream.h"
 #include "kddlib/net/http/CurlError.h"
-#include "kddlib/net/http/CurlShare.h"
 #include "kddlib/net/http/KxCurlDownloadStream.h"
-#include "kddlib/net/http/KxCurlRequest.h"
+#include "kddlib/net/http/KxCurlHandleFactory.h"
 #include "support/HttpServer.h"
 #include "support/LogCapture.h"
 #include "support/Setting.h"
@@ -48,23 +47,16 @@ TEST(ClientNames, AreToldFromFilesByTheirFirstLettersAndLeadToTheWebService)
     EXPECT_EQ(KxCurlClient::url("GetStudy?x=1"), "https://pacs:8443/quil/Browser.svc/GetStudy?x=1");
 }
 
-TEST_F(Client, ReadsABodyOfAnyLengthAndKeepsTheConnection)
+TEST(HandleFactory, ForgetsTheOptionsOfAnEasyHandleAtOnce)
 {
-    NginxServer nginx(NginxServer::Scheme::Http, "location = /connection { return 200 $connection; }"
-                                                 "location /chunked/ { alias files/; ssi on; ssi_types *; }");
-    const QByteArray big(3'000'001, 'x');
-    nginx.addFile("big", big);
-    const QByteArray connection = client.readBytes(nginx.url("connection"), status);
-    EXPECT_EQ(client.readBytes(nginx.url("big"), status), big);
-    EXPECT_TRUE(status.ok());
-    EXPECT_EQ(status.bytesReceived, quint64(big.size()));
-    EXPECT_EQ(status.headers.at("content-length"), "3000001");
-    EXPECT_EQ(client.readBytes(nginx.url("chunked/big"), status), big);
-    EXPECT_EQ(status.headers.at("transfer-encoding"), "chunked");
-    EXPECT_EQ(client.readBytes(nginx.url("connection"), status), connection);
-    EXPECT_THAT(client.readBytes(nginx.url("absent"), status).toStdString(), HasSubstr("404 Not Found"));
-    EXPECT_EQ(status.code, 404);
-    EXPECT_FALSE(status.ok() || status.failed);
+    KxCurlHandleFactory factory(1);
+    CurlEasy handle = factory.takeEasy();
+    CURL* const name = handle.get();
+    curl_easy_setopt(name, CURLOPT_PRIVATE, name);
+    factory.giveBack(std::move(handle));
+    void* kept = name;
+    curl_easy_getinfo(name, CURLINFO_PRIVATE, &kept);
+    EXPECT_EQ(kept, nullptr);
 }
 
 TEST_F(Client, KeepsHeadersByNameAndTheCodeOfTheFinalAnswer)
@@ -85,10 +77,6 @@ TEST_F(Client, PostsBytesWithTheirTypeAndReadsTheAnswer)
     EXPECT_THAT(lastRequest(), HasSubstr("\r\nContent-Type: text/plain\r\n"));
     EXPECT_THAT(lastRequest(), Not(HasSubstr("Expect:")));
     EXPECT_TRUE(server.requests().back().endsWith("\r\n\r\n" + large));
-    client.postBytes(server.url("p"), {}, status);
-    EXPECT_THAT(lastRequest(), StartsWith("POST /p HTTP/1.1\r\n"));
-    EXPECT_THAT(lastRequest(),
-                HasSubstr("\r\nContent-Type: application/octet-stream\r\nContent-Length: 0\r\n"));
     client.postJson(server.url("p"), {{QStringLiteral("k"), 2}}, status);
     EXPECT_THAT(lastRequest(), HasSubstr("\r\nContent-Type: application/json\r\n"));
     EXPECT_THAT(lastRequest(), EndsWith("\r\n\r\n{\n    \"k\": 2\n}\n"));
@@ -110,38 +98,20 @@ TEST_F(Client, SendsNothingThatIsNotWhatItSeems)
     EXPECT_THAT(lastRequest(), StartsWith("GET /a/../b HTTP/1.1\r\n"));
 }
 
-TEST_F(Client, DeletesCloudObjects)
-{
-    const LogCapture log;
-    client.setSessionID("12");
-    EXPECT_TRUE(client.deleteObject("gs://b/x/y#1"));
-    EXPECT_THAT(lastRequest(), StartsWith("DELETE /b/x%2Fy%231 HTTP/1.1\r\nHost: 127.0.0.1:"));
-    EXPECT_THAT(lastRequest(), HasSubstr("\r\nCache-Control: no-transform\r\n"));
-    EXPECT_THAT(lastRequest(), HasSubstr("\r\nUser-Agent: Korvex kddlib "));
-    cloud.set("http://127.0.0.1:1/");
-    EXPECT_THROW(client.deleteObject("gs://b/x"), CurlError);
-}
-
 struct ServerFault
 {
-    const char* name;
     ScriptedServer::Reply reply;
     const char* body;
     const char* reason;
 };
 
 const ServerFault kServerFaults[] = {
-    {"BodyEndsEarly", {"HTTP/1.1 200 OK\r\nContent-Length: 9\r\n\r\nfour"}, "four", "5 bytes remaining"},
-    {"ResetInTheBody", {"HTTP/1.1 200 OK\r\nContent-Length: 9\r\n\r\nfour", {}, true}, "four", "transfer: "},
-    {"ChunkEndsEarly",
-     {"HTTP/1.1 200 OK\r\nTransfer-Encoding: chunked\r\n\r\n9\r\nfour"},
-     "four",
-     "outstanding"},
-    {"LengthIsNoNumber", {"HTTP/1.1 200 OK\r\nContent-Length: nine\r\n\r\nfour"}, "", "Content-Length"},
-    {"NothingAtAll", {""}, "", "Empty reply"},
-    {"OtherProtocol", {"220 mail.example ESMTP\r\n"}, "", "HTTP/0.9"},
-    {"HeaderLineWithoutEnd", {"HTTP/1.1 200 OK\r\nX: ", QByteArray(9999, 'x')}, "", "Out of memory"},
-    {"HeadersWithoutEnd", {"HTTP/1.1 200 OK\r\n", QByteArray(99, 'x') + ": y\r\n"}, "", "Too large"},
+    {{"HTTP/1.1 200 OK\r\nContent-Length: 9\r\n\r\nfour"}, "four", "5 bytes remaining"},
+    {{"HTTP/1.1 200 OK\r\nContent-Length: 9\r\n\r\nfour", {}, true}, "four", "transfer: "},
+    {{"HTTP/1.1 200 OK\r\nTransfer-Encoding: chunked\r\n\r\n9\r\nfour"}, "four", "outstanding"},
+    {{""}, "", "Empty reply"},
+    {{"HTTP/1.1 200 OK\r\nX: ", QByteArray(9999, 'x')}, "", "Out of memory"},
+    {{"HTTP/1.1 200 OK\r\n", QByteArray(99, 'x') + ": y\r\n"}, "", "Too large"},
 };
 
 TEST_F(Client, FailsWhereATransferBreaksOffAndKeepsWhatArrived)
@@ -149,9 +119,9 @@ TEST_F(Client, FailsWhereATransferBreaksOffAndKeepsWhatArrived)
     for (const ServerFault& fault : kServerFaults) {
         const LogCapture log;
         const ScriptedServer faulty([&](const QByteArray&) { return fault.reply; });
-        EXPECT_EQ(client.readBytes(faulty.url("x"), status), fault.body) << fault.name;
-        EXPECT_TRUE(status.failed) << fault.name;
-        EXPECT_EQ(log.count(fault.reason), 1) << fault.name << testing::PrintToString(log.lines());
+        EXPECT_EQ(client.readBytes(faulty.url("x"), status), fault.body);
+        EXPECT_TRUE(status.failed) << fault.reason;
+        EXPECT_EQ(log.count(fault.reason), 1) << fault.reason << testing::PrintToString(log.lines());
     }
     client.readBytes("http://127.0.0.1:1/x", status);
     EXPECT_THAT(status.reason(), HasSubstr("Failed to connect"));
@@ -194,58 +164,23 @@ TEST_F(Client, FollowsNoRedirectThatLeadsAstray)
     EXPECT_EQ(endless.requests().size() - before, 6U);
 }
 
-class ManyThreads : public testing::TestWithParam<CurlShare::Connections>
-{
-};
-
-TEST_P(ManyThreads, GetEachItsOwnAnswer)
-{
-    const NginxServer nginx(NginxServer::Scheme::Http, "location / { return 200 $uri; }");
-    const CurlShare share(GetParam());
-    const auto factory = std::make_shared<KxCurlHandleFactory>(4);  // too few to keep all handles
-    onThreads(8, [&](int thread) {
-        for (int round = 0; round < 25; ++round) {
-            KxCurlRequest request(factory, share, nginx.url(std::to_string(thread)), "GET");
-            request.perform();
-            EXPECT_EQ(request.response(), '/' + QByteArray::number(thread));
-        }
-    });
-}
-
-TEST_F(Client, NeedsNoMoreConnectionsThanThreads)
+TEST_F(Client, GivesEachThreadItsOwnAnswerAndNeedsNoMoreConnectionsThanThreads)
 {
     constexpr int kThreads = 6;
-    const NginxServer nginx(NginxServer::Scheme::Http, "location / { return 200 $connection; }");
+    const NginxServer nginx(NginxServer::Scheme::Http, "location / { return 200 $uri/$connection; }");
     std::mutex mutex;
     std::set<QByteArray> connections;
-    onThreads(kThreads, [&](int) {
+    onThreads(kThreads, [&](int thread) {
         for (int round = 0; round < 30; ++round) {
             KxHttpStatus own;
-            const QByteArray connection = client.readBytes(nginx.url("x"), own);
+            const QList<QByteArray> answer =
+                client.readBytes(nginx.url(std::to_string(thread)), own).split('/');
+            EXPECT_EQ(answer.value(1), QByteArray::number(thread));
             const std::lock_guard lock(mutex);
-            connections.insert(connection);
+            connections.insert(answer.value(2));
         }
     });
     EXPECT_LE(connections.size(), std::size_t(kThreads));
 }
-
-TEST_F(Client, DeletesOverOneConnection)
-{
-    const LogCapture log;
-    const NginxServer nginx(NginxServer::Scheme::Http, "location = /accepted { stub_status; }"
-                                                       "location /b/ { return 204; }");
-    cloud.set(nginx.url(""));
-    const auto accepted = [&] {
-        const QByteArray counts = client.readBytes(nginx.url("accepted"), status).split('\n').value(2);
-        return counts.trimmed().split(' ').first().toInt();
-    };
-    const int before = accepted();
-    for (int i = 0; i < 5; ++i)
-        EXPECT_TRUE(client.deleteObject("gs://b/x"));
-    EXPECT_EQ(accepted(), before + 1);
-}
-
-INSTANTIATE_TEST_SUITE_P(Net, ManyThreads,
-                         testing::Values(CurlShare::Connections::Shared, CurlShare::Connections::PerHandle));
 
 }  // namespace

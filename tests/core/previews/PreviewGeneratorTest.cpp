@@ -94,11 +94,4 @@ TEST(PreviewGenerator, FitsSquarePixelsIntoTheSize)
     }
 }
 
-TEST(PreviewGenerator, SaysWhenThereIsNothingToCompress)
-{
-    const LogCapture log;
-    EXPECT_EQ(PreviewGenerator::createPreviewData(QImage()), QByteArray());
-    EXPECT_EQ(log.count("Failed to compress preview image in JPEG format"), 1);
-}
-
 }  // namespace

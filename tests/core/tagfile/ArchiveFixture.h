@@ -10,12 +10,11 @@
 #include "platform/volumefile/OrlanMeshWriter.h"
 #include "platform/volumefile/SOPInstanceUtility.h"
 #include "support/DatasetBuilder.h"
+#include "support/FileContent.h"
 #include "support/TemporaryStore.h"
 #include "support/TreeText.h"
 
-#include <QDir>
 #include <QFile>
-#include <QFileInfo>
 
 #include <gtest/gtest.h>
 
@@ -233,9 +232,9 @@ protected:
     {
         Files files;
         for (const QByteArray& study : studies) {
-            QFile file(TagFile::cacheFilePathForStudy(study.constData()));
-            if (file.open(QIODevice::ReadOnly))
-                files[study] = file.readAll();
+            const QString path = TagFile::cacheFilePathForStudy(study.constData());
+            if (QFile::exists(path))
+                files[study] = fileContent(path);
         }
         return files;
     }
@@ -243,14 +242,10 @@ protected:
     static void putBack(const Uids& studies, const Files& files)
     {
         for (const QByteArray& study : studies) {
-            QFile file(TagFile::cacheFilePathForStudy(study.constData()));
-            file.remove();
-            const auto content = files.find(study);
-            if (content == files.end())
-                continue;
-            QDir().mkpath(QFileInfo(file).path());
-            ASSERT_TRUE(file.open(QIODevice::WriteOnly));
-            file.write(content->second);
+            const QString path = TagFile::cacheFilePathForStudy(study.constData());
+            QFile::remove(path);
+            if (files.count(study) > 0)
+                putFile(path, files.at(study));
         }
     }
 

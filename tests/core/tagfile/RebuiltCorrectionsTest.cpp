@@ -30,33 +30,6 @@ protected:
     const Uids mAll = {"1", "2", "3"};
 };
 
-TEST_F(RebuiltCorrections, EditsStayWithTheirLogs)
-{
-    correct(edit({"a", "b"},
-                 {{DCM_PatientName, QStringLiteral("Roe^R")}, {DCM_InstanceNumber, QStringLiteral("")}}));
-    correct(edit({"a"},
-                 {{DCM_PatientName, QStringLiteral("Poe^P")}, {DCM_ImageComments, QStringLiteral("new")}}));
-    EXPECT_EQ(waiting(), 0);
-    expectSurvival(mAll);
-    EXPECT_EQ(value("1", "a", DCM_PatientName), "Poe^P");
-    EXPECT_EQ(value("1", "b", DCM_PatientName), "Roe^R");
-    EXPECT_EQ(value("1", "c", DCM_PatientName), "Doe^J");
-    std::vector<Kxg::StudySummary> list;
-    ASSERT_TRUE(mCatalogue->listStudies(list).good());
-    EXPECT_EQ(list.front().patientName, "Poe^P");
-}
-
-TEST_F(RebuiltCorrections, MovesStay)
-{
-    correct(move({"a", "b"}, "1", "2", {{DCM_PatientName, QStringLiteral("Roe^R")}}));
-    correct(move({"c"}, "1", "3", {{DCM_SOPInstanceUID, QStringLiteral("c2")}}));
-    EXPECT_EQ(waiting(), 0);
-    EXPECT_EQ(studies(), (Uids{"2", "3"})) << "nothing is left of the first one";
-    expectSurvival(mAll);
-    EXPECT_EQ(imagesIn("2"), (Uids{"a", "b", "z"}));
-    EXPECT_EQ(imagesIn("3"), Uids{"c2"});
-}
-
 TEST_F(RebuiltCorrections, AMoveOntoAnImageOfTheSameUidTakesItsPlace)
 {
     const LogCapture quiet;
@@ -82,40 +55,15 @@ TEST_F(RebuiltCorrections, WhatWasMovedAndDeletedDoesNotComeBack)
 TEST_F(RebuiltCorrections, AFileThatArrivesAgainUnderItsFormerStudyFollows)
 {
     correct(move({"a"}, "1", "2", {{DCM_PatientName, QStringLiteral("Roe^R")}}));
-    save(image("a", "1").with(DCM_ImageComments, "sent again"), "again");
+    const DcmTag creator(0x0071, 0x0010, EVR_LO);  // of the block that the log had
+    const DcmTag theirs(0x0071, 0x1021, EVR_LO);
+    save(image("a", "1").with(DCM_ImageComments, "sent again").with(creator, "Other").with(theirs, "theirs"),
+         "again");
     buildAll();
     EXPECT_EQ(imagesIn("1") + imagesIn("2"), (Uids{"b", "c", "a", "z"}));
     EXPECT_EQ(value("2", "a", DCM_PatientName), "Roe^R");
-    EXPECT_EQ(value("2", "a", DCM_ImageComments), "sent again");
-}
-
-/// As if the process had died once the database knew the correction, and before or after the one tag file was written.
-TEST_F(RebuiltCorrections, WhatIsInterruptedIsCompletedByABuildOrByTheJobAgain)
-{
-    const QAData jobs[] = {edit({"a"}, {{DCM_PatientName, QStringLiteral("Roe^R")}}),
-                           edit({"a"}, {{DCM_SeriesInstanceUID, QStringLiteral("1.7")}}),
-                           move({"a", "b"}, "1", "2", {{DCM_PatientName, QStringLiteral("Poe^P")}}),
-                           move({"a"}, "2", "3", {{DCM_SOPInstanceUID, QStringLiteral("a3")}})};
-    for (const QAData& job : jobs) {
-        const Files before = tagFiles(mAll);
-        correct(job);
-        const std::string after = shown(mAll);
-        const Files written = tagFiles(mAll);
-        for (const Uids& unwritten : {mAll, Uids{job.oldStudyUID}}) {
-            putBack(mAll, written);
-            putBack(unwritten, before);
-            QAData again = job;
-            QString message;
-            EXPECT_TRUE(TagFile::applyQA(again, message)) << message.toStdString();
-            EXPECT_EQ(shown(mAll), after);
-            putBack(unwritten, before);
-            buildAll();
-            EXPECT_EQ(shown(mAll), after);
-        }
-        std::vector<Kxg::ImageCorrection> rows;
-        ASSERT_TRUE(mCatalogue->corrections("3", rows).good());
-        EXPECT_LE(rows.size(), 1U);
-    }
+    EXPECT_EQ(value("2", "a", DCM_ImageComments) + value("2", "a", theirs), "sent againtheirs");
+    EXPECT_EQ(value("2", "a", {0x0071, 0x1122}), "20240131120000");
 }
 
 TEST_F(RebuiltCorrections, AnotherJobWaitsUntilTheInterruptedOneIsBuilt)
@@ -150,7 +98,8 @@ TEST_F(RebuiltCorrections, WhatCannotBeWrittenIsNotKeptEither)
         EXPECT_NE(refusal(edit({"a", "b"}, {{DCM_PatientName, QStringLiteral("Poe^P")}})), "");
         EXPECT_NE(refusal(move({"a", "b"}, "1", "3", {{DCM_SOPInstanceUID, QStringLiteral("x")}})), "")
             << "two of one UID";
-        EXPECT_NE(refusal(move({"a", "b"}, "1", "3")), "");
+        EXPECT_NE(refusal(move({"a", "b"}, "1", "3")), "") << "which leaves the large one";
+        EXPECT_NE(refusal(move({"large"}, "1", "2")), "") << "which brings it";
     }
     EXPECT_EQ(shown(mAll), before);
     EXPECT_EQ(waiting(), 0);
@@ -198,33 +147,6 @@ TEST_F(RebuiltCorrections, AJobOnWhatIsNotAdoptedYetKeepsAllOfIt)
     EXPECT_EQ(imagesIn("1") + imagesIn("2"), (Uids{"a", "b", "c2", "z"}));
 }
 
-TEST_F(RebuiltCorrections, AnImageWhoseFileCannotBeReadStaysAsItWas)
-{
-    const LogCapture log;
-    correct(edit({"a"}, {{DCM_PatientName, QStringLiteral("Roe^R")}}));
-    save("d", "1");
-    for (const char* name : {"a", "b", "d"})
-        QFile::remove(QString::fromLocal8Bit(path(name)));
-    const std::string before = shown(mAll);
-    build("1");
-    EXPECT_EQ(shown(mAll), before);
-    EXPECT_EQ(log.count("Could not open " + path("b").toStdString() + ": "), 1);
-    EXPECT_EQ(mGenerator.numKept(), 2);
-    EXPECT_EQ(mGenerator.numMissing(), 1);
-}
-
-TEST_F(RebuiltCorrections, AnImageWithoutUidIsKnownByItsPath)
-{
-    save(image("x", "1").without(DCM_SOPInstanceUID), "nameless");
-    buildAll();
-    correct(move({path("nameless")}, "1", "2", {{DCM_PatientName, QStringLiteral("Roe^R")}}));
-    expectSurvival(mAll);
-    EXPECT_EQ(imagesIn("2").size(), 2);
-    correct(edit({path("nameless")}, {{DCM_SOPInstanceUID, QStringLiteral("named")}}, "2"));
-    expectSurvival(mAll);
-    EXPECT_EQ(value("2", "named", DCM_PatientName), "Roe^R");
-}
-
 TEST_F(RebuiltCorrections, MovesInOppositeDirectionsAtOnceLoseNothing)
 {
     const LogCapture quiet;
@@ -237,15 +159,19 @@ TEST_F(RebuiltCorrections, MovesInOppositeDirectionsAtOnceLoseNothing)
             EXPECT_EQ(message, QString());
         }
     };
-    std::thread there(moveAll, "1", "2");
-    std::thread back(moveAll, "2", "1");
-    there.join();
-    back.join();
-    EXPECT_EQ(imagesIn("1").size() + imagesIn("2").size(), 4);
-    expectSurvival(mAll);
+    for (const QByteArray& database : {QByteArray(), mAddress}) {
+        Kxg::SetDatabaseServer(database);
+        std::thread there(moveAll, "1", "2");
+        std::thread back(moveAll, "2", "1");
+        there.join();
+        back.join();
+        EXPECT_EQ(imagesIn("1").size() + imagesIn("2").size(), 4);
+        Kxg::SetDatabaseServer(mAddress);
+        expectSurvival(mAll);
+    }
 }
 
-/// The same on a server.
+/// On a server.
 class RebuiltCorrectionsOnServer : public ArchiveTest
 {
 protected:
@@ -260,14 +186,19 @@ TEST_F(RebuiltCorrectionsOnServer, StayWithTheirLogs)
     for (const char* uid : {"a", "b"})
         save(uid, "1");
     buildAll();
-    correct(edit({"a"}, {{DCM_PatientName, QStringLiteral("Roe^R")}}));
+    correct(edit({"a", "b"}, {{DCM_PatientName, QStringLiteral("Roe^R")}}));
     correct(move({"a"}, "1", "2", {{DCM_SOPInstanceUID, QStringLiteral("a2")}}));
+    correct(move({"b"}, "1", "2"));
     EXPECT_EQ(waiting(), 0);
+    EXPECT_EQ(studies(), Uids{"2"}) << "nothing is left of the first one";
+    std::vector<Kxg::StudySummary> list;
+    ASSERT_TRUE(mCatalogue->listStudies(list).good());
+    EXPECT_EQ(list.front().patientName, "Roe^R");
     expectSurvival({"1", "2"});
-    EXPECT_EQ(value("2", "a2", DCM_PatientName), "Roe^R");
     correct(move({"a2"}, "2", "1", {{DCM_SOPInstanceUID, QStringLiteral("a")}}));
     expectSurvival({"1", "2"});
-    EXPECT_EQ(imagesIn("1"), (Uids{"a", "b"}));
+    EXPECT_EQ(value("1", "a", DCM_PatientName), "Roe^R");
+    EXPECT_EQ(imagesIn("2"), Uids{"b"});
 }
 
 // ---- overlays
@@ -301,19 +232,6 @@ TEST(ImageOverlay, IsReadBackAndDamageIsRefused)
         other.decode(damaged);
     }
     EXPECT_EQ(overlay.encode(), bytes);
-}
-
-TEST(ImageOverlay, ReplacesRemovesAndLeavesTheBlocksOfOthersAlone)
-{
-    const std::unique_ptr<TagMap> image(anImage("1").with(DCM_ImageComments, "x").map());
-    image->putAndInsertValue(DcmTagKey(0x0071, 0x0021), "Other", VrCode::LO, "theirs");
-    anOverlay().applyTo(*image);
-    QByteArray text;
-    EXPECT_TRUE(image->findAndGetString(DCM_PatientName, text) && text == "Doe^J");
-    EXPECT_EQ(image->findElement(DCM_ImageComments), nullptr);
-    EXPECT_TRUE(image->findAndGetString({0x0071, 0x0021}, "Other", text) && text == "theirs");
-    AuditLog log;
-    EXPECT_TRUE(log.read(*image) && log.text() == anOverlay().log().text());
 }
 
 }  // namespace

@@ -1,5 +1,5 @@
 #include "TagFileFixture.h"
-#include "platform/base/LogFile.h"
+#include "kddlib/tagfile/StudyFile.h"
 #include "platform/database/TagFileStamp.h"
 #include "support/Process.h"
 
@@ -27,8 +27,6 @@ bool merge(TagFile& file)
 class TagFileCache : public TagFileTest
 {
 protected:
-    void TearDown() override { LogFile::setLevel(LogFile::Level::Information); }
-
     /// Adds images whose values cannot be compressed much, so that more images always take more room.
     static void fill(TagFile& file, int from, int to)
     {
@@ -100,37 +98,20 @@ TEST_F(TagFileCache, AStampedReadKnowsTheStateThatWasWritten)
     EXPECT_FALSE(again.stamp() == file.stamp());
 }
 
-TEST_F(TagFileCache, AnAbsentFileIsWorthALineOnlyToWhoeverDebugs)
+TEST_F(TagFileCache, SaysWhatCannotBeReadOrWritten)
 {
     const LogCapture log;
     TagFile file;
     EXPECT_FALSE(file.readCacheFileForStudy(kStudy, false) || file.readCacheFileForStudy(kStudy, true));
-    EXPECT_TRUE(log.lines().empty());
     EXPECT_FALSE(file.failure().isEmpty() || file.wasLockedOut());
-    LogFile::setLevel(LogFile::Level::Timing);
-    EXPECT_FALSE(file.readCacheFileForStudy(kStudy, false));
-    EXPECT_EQ(log.count(named("Could not open ")), 1);
-}
-
-TEST_F(TagFileCache, SaysWhatCannotBeReadOrWritten)
-{
-    const LogCapture log;
+    EXPECT_TRUE(log.lines().empty()) << "an absent file is no fault";
     put(path(), "no tag file");
-    TagFile file;
     EXPECT_FALSE(file.readCacheFileForStudy(kStudy, true));
-    EXPECT_EQ(log.count("Tag file has incorrect header"), 1);
     EXPECT_EQ(log.count(named("Could not read ")), 1);
     EXPECT_FALSE(file.close());
-    QFile::remove(path());
-    QDir().mkpath(path());
-    EXPECT_FALSE(file.readCacheFileForStudy(kStudy, false));
-    EXPECT_EQ(log.count(named("Could not open ") + ": "), 1);
     fill(file, 1, 1);
-    EXPECT_FALSE(file.writeCacheFile());
-    EXPECT_EQ(log.count(named("Could not open ") + " for writing"), 1);
     EXPECT_FALSE(file.writeCacheFile("/proc/kdd/file.tc"));
     EXPECT_EQ(log.count("Could not open /proc/kdd/file.tc for writing"), 1);
-    EXPECT_FALSE(file.failure().isEmpty());
     EXPECT_EQ(file.imagesByUID().size(), 1);
 }
 
@@ -139,30 +120,28 @@ TEST_F(TagFileCache, WhoKeepsItOpenLocksOthersOut)
     ASSERT_TRUE(put(1, 2, write));
     TagFile file;
     ASSERT_TRUE(file.readCacheFileForStudy(kStudy, true));
-    const auto isLockedOut = [](bool (*operation)(TagFile&), const char* ending) {
-        const LogCapture log;
-        TagFile other;
-        fill(other, 3, 3);
-        return !operation(other) && other.wasLockedOut() && !other.failure().isEmpty() &&
-               log.count(named("Could not open ") + ending) == (*ending != 0 ? 1 : 0);
-    };
-    const auto isReader = [&] {
-        return isLockedOut([](TagFile& other) { return other.readCacheFileForStudy(kStudy, false); }, ": ");
-    };
-    const auto isKeeper = [&] {
-        return isLockedOut([](TagFile& other) { return other.readCacheFileForStudy(kStudy, true); }, "");
-    };
-    const auto isMerger = [&] {
-        return isLockedOut([](TagFile& other) { return merge(other) || other.imagesByUID().size() != 1; },
-                           " for read-write: error code ");
-    };
-    EXPECT_EQ(inChild(isReader), 1);
-    EXPECT_EQ(inChild(isKeeper), 1);
-    EXPECT_EQ(inChild(isMerger), 1);
+    EXPECT_FALSE(file.readCacheFileForStudy(kStudy, false)) << "it is open already";
+    EXPECT_EQ(file.imagesByUID().size(), 2);
+    const std::pair<bool (*)(TagFile&), const char*> others[] = {
+        {[](TagFile& other) { return other.readCacheFileForStudy(kStudy, false); }, ": "},
+        {[](TagFile& other) { return other.readCacheFileForStudy(kStudy, true); }, nullptr},
+        {[](TagFile& other) { return merge(other) || other.imagesByUID().size() != 1; },
+         " for read-write: error code "}};
+    for (const auto& [operation, ending] : others) {
+        const auto isLockedOut = [&operation = operation, &ending = ending] {
+            const LogCapture log;
+            TagFile other;
+            fill(other, 3, 3);
+            return !operation(other) && other.wasLockedOut() && !other.failure().isEmpty() &&
+                   (ending == nullptr || log.count(named("Could not open ") + ending) == 1);
+        };
+        EXPECT_EQ(inChild(isLockedOut), 1);
+    }
     fill(file, 4, 4);
     EXPECT_TRUE(file.writeCacheFile());
     EXPECT_EQ(inChild([] { return put(5, 5, merge); }), 1);
     EXPECT_EQ(imagesFound(), 4);
+    EXPECT_FALSE(file.close()) << "not open any more";
 }
 
 TEST_F(TagFileCache, WhoServesWaitsLongerThanOneWhoReads)
@@ -184,20 +163,6 @@ TEST_F(TagFileCache, WhoServesWaitsLongerThanOneWhoReads)
         EXPECT_TRUE(serving.get());
     }
     qunsetenv("KDD_READ_PATIENCE");
-}
-
-TEST_F(TagFileCache, IsOpenedOnlyOnce)
-{
-    const LogCapture log;
-    ASSERT_TRUE(put(1, 2, write));
-    TagFile file;
-    ASSERT_TRUE(file.readCacheFileForStudy(kStudy, true));
-    EXPECT_FALSE(file.readCacheFileForStudy(kStudy, false));
-    EXPECT_EQ(log.count("Tag file already opened"), 1);
-    EXPECT_EQ(file.imagesByUID().size(), 2);
-    EXPECT_TRUE(file.close());
-    EXPECT_FALSE(file.close());
-    EXPECT_TRUE(file.readCacheFileForStudy(kStudy, false));
 }
 
 TEST_F(TagFileCache, AShorterStudyInAFileKeptOpenLeavesTheOldEnd)
@@ -232,42 +197,30 @@ TEST_F(TagFileCache, AnEmptyOneDeletesTheFileKeptOpen)
     EXPECT_EQ(imagesFound(), 1);
 }
 
-TEST_F(TagFileCache, AFullDiskLeavesTheOldFileWhole)
+TEST_F(TagFileCache, AFullDiskLeavesTheOldFileWholeAndNoNewOne)
 {
-    ASSERT_TRUE(put(1, 4, write));
-    const QByteArray before = content();
+    const auto isRefused = [](qint64 size, bool keepOpen, bool (*how)(TagFile&)) {
+        const LogCapture log;
+        TagFile file;
+        if (keepOpen && !file.readCacheFileForStudy(kStudy, true))
+            return false;
+        fill(file, 1, 9);
+        const FullDisk disk(size + 50);
+        return !how(file) && !file.failure().isEmpty() && log.count(named("")) == 1 &&
+               file.imagesByUID().size() == 9;
+    };
     for (const auto how : {write, merge}) {
-        for (const bool keepOpen : {false, true}) {
-            if (keepOpen && how == merge)
-                continue;
-            EXPECT_EQ(inChild([&] {
-                          const LogCapture log;
-                          TagFile file;
-                          if (keepOpen && !file.readCacheFileForStudy(kStudy, true))
-                              return false;
-                          fill(file, 1, 9);
-                          const FullDisk disk(before.size() + 50);
-                          return !how(file) && !file.failure().isEmpty() && log.count(named("")) == 1 &&
-                                 file.imagesByUID().size() == 9;
-                      }),
-                      1);
-        }
-    }
-    EXPECT_EQ(content(), before);
-    EXPECT_FALSE(QFile::exists(journal()));
-}
-
-TEST_F(TagFileCache, AFullDiskLeavesNoNewFile)
-{
-    const LogCapture log;
-    for (const auto how : {write, merge}) {
-        EXPECT_EQ(inChild([&] {
-                      const FullDisk disk(100);
-                      return !put(1, 3, how);
-                  }),
-                  1);
+        EXPECT_EQ(inChild([&] { return isRefused(0, false, how); }), 1);
         EXPECT_FALSE(QFile::exists(path()) || QFile::exists(journal()));
     }
+    ASSERT_TRUE(put(1, 4, write));
+    const QByteArray before = content();
+    for (const auto& [keepOpen, how] : {std::pair(false, write), {true, write}, {false, merge}})
+        EXPECT_EQ(
+            inChild([&, keepOpen = keepOpen, how = how] { return isRefused(before.size(), keepOpen, how); }),
+            1);
+    EXPECT_EQ(content(), before);
+    EXPECT_FALSE(QFile::exists(journal()));
 }
 
 /// What a writer of images 1 to 9 left when it died after it had written so much of them over images 1 to 4.
@@ -325,21 +278,33 @@ TEST_F(TagFileCache, TheBytesOfAFolderNameSurvive)
 {
     const std::filesystem::path folder = mStore.folder().toStdString() + "/m\xe9ta";
     TagFile::setMetaFolder(folder.c_str());
+    EXPECT_TRUE(put(1, 1, write) && put(2, 2, merge));
+    EXPECT_EQ(imagesFound(), 2);
+    EXPECT_GT(std::filesystem::remove_all(folder), 0U);
+}
+
+TEST_F(TagFileCache, ACopyWrittenElsewhereLeavesTheFileHeldOpenTheStudysOwn)
+{
     TagFile file;
-    add(file, anImage("1"));
-    ASSERT_TRUE(file.writeCacheFile());
-    TagFile more;
-    add(more, anImage("2"));
-    ASSERT_TRUE(more.mergeIntoCacheFile());
-    TagFile again;
-    ASSERT_TRUE(again.readCacheFileForStudy("1.2", true));
-    EXPECT_EQ(again.imagesByUID().size(), 2);
-    const std::filesystem::directory_iterator end;
-    EXPECT_EQ(std::distance(std::filesystem::directory_iterator(folder.parent_path()), end), 1);
-    EXPECT_TRUE(std::filesystem::exists(folder));
-    again.clear();
-    EXPECT_TRUE(again.writeCacheFile()) << "of nothing, which removes the file";
-    EXPECT_FALSE(more.readCacheFileForStudy("1.2", false));
+    ASSERT_TRUE(put(1, 2, write) && file.readCacheFileForStudy(kStudy, true));
+    const QString elsewhere = mStore.filePath("elsewhere.tc");
+    ASSERT_TRUE(file.writeCacheFile(elsewhere.toLocal8Bit().constData()));
+    file.clear();
+    EXPECT_TRUE(file.writeCacheFile()) << "of nothing, which removes the file held open";
+    EXPECT_FALSE(QFile::exists(path()));
+    EXPECT_TRUE(QFile::exists(elsewhere));
+}
+
+TEST_F(TagFileCache, OneMadeInVainGoesUnlessAJournalIsItsContent)
+{
+    for (const bool isPromised : {false, true}) {
+        StudyFile file;
+        ASSERT_TRUE(file.open(path(), StudyFile::Access::HoldOrMake));
+        if (isPromised)
+            put(journal(), journalOf("content"));
+        file.removeIfNeverWritten();
+        EXPECT_EQ(QFile::exists(path()), isPromised);
+    }
 }
 
 }  // namespace

@@ -107,34 +107,24 @@ TEST_F(TagFileFormat, TheOldLayoutRunsToTheEndAndHasNoPreviews)
     EXPECT_EQ(imagesText(again), imagesText(file));
 }
 
-TEST_F(TagFileFormat, PreviewsStandBehindTheBodyAndAreNumberedInIt)
+TEST_F(TagFileFormat, PreviewsStandBehindTheBodyAndOneThatIsNotThereIsDropped)
 {
     const QByteArray content = writtenWithPreviews();
-    const int end = kHeaderSize + bodySize(content);
-    EXPECT_EQ(content.left(end).count(kPreviewElement + '0'), 1);
-    EXPECT_EQ(content.left(end).count(kPreviewElement + '1'), 1);
-    const QByteArray table = QByteArray::fromHex("00000002 0000000a") + "first jpeg" +
-                             QByteArray::fromHex("0000000b") + "second jpeg";
-    EXPECT_EQ(content.mid(end), table);
-    TagFile file;
-    ASSERT_TRUE(read(file, content));
-    EXPECT_EQ(previewOf(file, "1"), "first jpeg");
-    EXPECT_EQ(previewOf(file, "2"), "second jpeg");
-}
-
-TEST_F(TagFileFormat, APreviewThatIsNotThereIsDropped)
-{
+    EXPECT_EQ(content.mid(kHeaderSize + bodySize(content)),
+              QByteArray::fromHex("00000002 0000000a") + "first jpeg" + QByteArray::fromHex("0000000b") +
+                  "second jpeg");
     const LogCapture log;
-    std::vector<QByteArray> contents;
+    std::vector<QByteArray> damaged;
     for (const char number : {'2', '9', '-', 'x', '\0'})
-        contents.push_back(writtenWithPreviews().replace(kPreviewElement + '1', kPreviewElement + number));
+        damaged.push_back(QByteArray(content).replace(kPreviewElement + '1', kPreviewElement + number));
     for (const int lost : {1, 11, 13, 15})
-        contents.push_back(writtenWithPreviews().chopped(lost));
-    for (const QByteArray& content : contents) {
+        damaged.push_back(content.chopped(lost));
+    damaged.push_back(content);
+    for (const QByteArray& each : damaged) {
         TagFile file;
-        ASSERT_TRUE(read(file, content));
+        ASSERT_TRUE(read(file, each));
         EXPECT_EQ(previewOf(file, "1"), "first jpeg");
-        EXPECT_EQ(previewOf(file, "2"), "none");
+        EXPECT_EQ(previewOf(file, "2"), each == content ? "second jpeg" : "none");
     }
     EXPECT_TRUE(log.lines().empty());
 }
@@ -191,33 +181,27 @@ struct Unreadable
     void (*spoil)(TagFile& file);
 };
 
-TagMap* nestedItems(int depth)
-{
-    auto* item = new TagMap;
-    for (int i = 0; i < depth; ++i) {
-        auto* sequence = new TagSequence;
-        sequence->addItem(item);
-        item = new TagMap;
-        item->putElement(DCM_RequestAttributesSequence, sequence);
-    }
-    return item;
-}
-
 void nest(TagFile& file, int depth)
 {
-    const std::unique_ptr<TagMap> outermost(nestedItems(depth));
-    file.findImage("2")->putElement(DCM_RequestAttributesSequence,
-                                    outermost->findElement(DCM_RequestAttributesSequence)->clone());
+    std::unique_ptr<TagSequence> outermost;
+    for (int i = 0; i < depth; ++i) {
+        auto* item = new TagMap;
+        if (outermost != nullptr)
+            item->putElement(DCM_RequestAttributesSequence, outermost.release());
+        outermost = std::make_unique<TagSequence>();
+        outermost->addItem(item);
+    }
+    file.findImage("2")->putElement(DCM_RequestAttributesSequence, outermost.release());
 }
 
 /// More items and values than the format allows, which share their values, so that few are in memory.
 void addTooMany(TagFile& file)
 {
     constexpr int kValues = 4000;
+    auto* sequence = new TagSequence;
     auto* first = new TagMap;
     for (int i = 0; i < kValues; ++i)
         first->markAsMissing({0x0009, static_cast<Uint16>(0x1000 + i)});
-    auto* sequence = new TagSequence;
     sequence->addItem(first);
     for (int i = 0; i < kMaxElements / kValues; ++i)
         sequence->addItem(new TagMap(*first));
@@ -264,36 +248,22 @@ TEST_F(TagFileFormat, IsNotWrittenWithWhatItsReaderWouldRefuse)
         EXPECT_EQ(file.failure(), QLatin1String(row.reason));
         EXPECT_EQ(log.count(row.reason), 1);
         EXPECT_EQ(content(), before);
-        if (&row == &kUnreadable[0]) {
-            QByteArray streamed;
-            QDataStream out(&streamed, QIODevice::WriteOnly);
-            EXPECT_FALSE(file.writeCacheFile(out) || file.mergeIntoCacheFile());
-            EXPECT_EQ(log.count(row.reason), 3);
-            EXPECT_TRUE(streamed.isEmpty());
-            EXPECT_EQ(content(), before);
-        }
     }
-}
-
-TEST_F(TagFileFormat, WhatItsReaderJustTakesIsWritten)
-{
     TagFile file;
     add(file, anImage("1"));
     add(file, anImage("2"));
     nest(file, kMaxItemDepth);
     TagFile again;
-    ASSERT_TRUE(read(again, written(file)));
-    EXPECT_EQ(treeText(again), treeText(file));
+    ASSERT_TRUE(read(again, written(file))) << "what its reader just takes";
+    nest(file, kMaxItemDepth + 1);
+    QByteArray streamed;
+    QDataStream out(&streamed, QIODevice::WriteOnly);
+    EXPECT_FALSE(file.writeCacheFile(out) || file.mergeIntoCacheFile());
+    EXPECT_TRUE(streamed.isEmpty());
 }
 
-struct Refusal
-{
-    const char* message;
-    int at;
-    char byte;
-};
-
-const Refusal kRefusals[] = {
+/// The message, and the byte of the header that is to blame.
+const std::tuple<const char*, int, char> kRefusals[] = {
     {"Tag file has incorrect header", 3, 'b'},
     {"Tag file has unsupported version", 4, 1},
     {"Tag file has unsupported compression format", 7, 3},
@@ -303,16 +273,16 @@ const Refusal kRefusals[] = {
 
 TEST_F(TagFileFormat, SaysWhyItCannotBeRead)
 {
-    for (const Refusal& row : kRefusals) {
+    for (const auto& [message, at, byte] : kRefusals) {
         const LogCapture log;
         QByteArray content = writtenWithPreviews();
-        content[row.at] = row.byte;
+        content[at] = byte;
         TagFile file;
         add(file, anImage("held before"));
         EXPECT_FALSE(read(file, content));
         EXPECT_TRUE(file.isEmpty());
-        EXPECT_EQ(log.lines(), std::vector<std::string>{row.message});
-        EXPECT_EQ(file.failure(), QLatin1String(row.message));
+        EXPECT_EQ(log.lines(), std::vector<std::string>{message});
+        EXPECT_EQ(file.failure(), QLatin1String(message));
     }
 }
 

@@ -47,7 +47,7 @@ protected:
         mFile.addTagMap(anImage().inSeries("1.2.0").without(DCM_SOPInstanceUID).map(), "/a\\b", false);
         std::vector<VolumeInfo> infos;
         for (int i = any(6); i > 0; --i) {
-            infos.push_back(anyVolume(i));
+            infos.push_back(anyVolume());
             expect(infos.back());
         }
         addVolumes(mFile, infos);
@@ -62,9 +62,9 @@ protected:
     }
 
     /// Images of other series, strangers, images twice and frames included.
-    VolumeInfo anyVolume(int number)
+    VolumeInfo anyVolume()
     {
-        VolumeInfo info = aVolume({}, ("x-stack_part" + QByteArray::number(number) + "1.vol").constData());
+        VolumeInfo info = aVolume({}, ("x-stack_part" + QByteArray::number(++mNumber) + ".vol").constData());
         const bool hasFrames = any(3) == 0;
         std::set<std::string> uids;
         for (int i = 1 + any(8); i > 0; --i) {
@@ -137,8 +137,16 @@ protected:
         case 6:
             return correct();
         default:
-            return;
+            return addVolume();
         }
+    }
+
+    void addVolume()
+    {
+        const VolumeInfo info = anyVolume();
+        expect(info);
+        if (!mFile.isEmpty())
+            addVolumes(mFile, {info});
     }
 
     /// The database lists all but a few images.
@@ -171,9 +179,11 @@ protected:
         if (mFile.isEmpty() || !mFile.writeCacheFile())
             return;
         TagFile arrivals;
-        for (int i = 1 + any(4); i > 0; --i) {
+        for (int i = 1 + any(any(2) == 0 ? 4 : 40); i > 0; --i) {
             const QByteArray uid = anyUID();
-            place(arrivals, uid, mSeries.count(uid) != 0 && any(2) == 0 ? mSeries[uid] : anySeries());
+            const bool stays = mSeries.count(uid) != 0 && any(2) == 0;
+            if (arrivals.findImage(uid) == nullptr)
+                place(arrivals, uid, stays ? mSeries[uid] : anySeries());
         }
         ASSERT_TRUE(arrivals.mergeIntoCacheFile());
         ASSERT_TRUE(mFile.readCacheFileForStudy("1.2", false));
@@ -240,6 +250,7 @@ protected:
     }
 
     std::mt19937 mRandom;
+    int mNumber = 10;  // of the last volume
     TagFile mFile;
     std::map<QByteArray, QByteArray> mSeries;  // by image
     std::map<QByteArray, Stack> mStacks;       // by suffix

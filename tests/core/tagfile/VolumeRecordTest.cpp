@@ -216,20 +216,6 @@ TEST(VolumeRecord, WhatTheSliceCountsClaimIsHeldAgainstWhatIsThere)
     }
 }
 
-TEST(VolumeList, ACountOfVolumesIsHeldAgainstWhatIsThere)
-{
-    for (const qint32 count : {2, 65534, 0x7FFFFFFF, -1}) {
-        KxMsg list;
-        list << quint16(65535) << count;
-        Blobs previews;
-        Volume(0).serialize(list, previews);
-        TagMap series;
-        series.deserializeVolumes(list, {});
-        EXPECT_TRUE(list.failed()) << count;
-        EXPECT_TRUE(series.volumes().isEmpty());
-    }
-}
-
 TEST(VolumeList, NamesNoMoreImagesThanItsReaderTakes)
 {
     Series empty;
@@ -248,23 +234,6 @@ TEST(VolumeList, NamesNoMoreImagesThanItsReaderTakes)
     }
 }
 
-TEST(VolumeList, ImagesAreThoseThatNameTheVolumeSortedByTheirNumber)
-{
-    Series series;
-    for (const char* indexes : {"\x02", "", "\x02\x01\x02", "\x02"})
-        series.addImage(indexes);
-    series.addImage(QByteArray("\0\x02", 2));
-    series.node.children().at(0)->putAndInsertInt(DCM_InstanceNumber, 9);
-    series.node.children().at(1)->putAndInsertInt(kVolumeIndex, 300);
-    for (int i = 0; i <= 300; ++i)
-        series.addStack();
-    ASSERT_TRUE(series.read(series.written()));
-    const std::pair<int, const char*> expected[] = {
-        {0, "5 "}, {1, "3 "}, {2, "3 4 5 1 "}, {44, ""}, {300, "2 "}};
-    for (const auto& [volume, images] : expected)
-        EXPECT_EQ(series.images(volume), images) << volume;
-}
-
 TEST(VolumeList, ImagesInheritTheIndexAndTheSignThatThePaddingHas)
 {
     for (const bool isSigned : {false, true}) {
@@ -280,19 +249,6 @@ TEST(VolumeList, ImagesInheritTheIndexAndTheSignThatThePaddingHas)
         EXPECT_EQ(series.images(0), "1 2 3 ");
         EXPECT_EQ(series.node.volumes().at(0)->paddingValue(), isSigned ? -2000 : 63536);
         EXPECT_EQ(series.node.volumes().at(0)->paddingRangeLimit(), isSigned ? -1 : 65535);
-    }
-}
-
-TEST(VolumeRecord, ATruncatedVolumeIsRefusedOrHasNoExtraData)
-{
-    TagMap image;
-    for (unsigned seed = 0; seed < 60; ++seed) {
-        const QByteArray whole = body(RandomVolumes{std::mt19937(seed)}.volume(&image));
-        for (int size = 0; size < whole.size(); ++size) {
-            KxMsg in(whole.left(size));
-            Volume again;
-            EXPECT_TRUE(!again.deserialize(in, {}, 0) || again.fileNameSuffix().isEmpty()) << size;
-        }
     }
 }
 

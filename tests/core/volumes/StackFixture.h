@@ -35,6 +35,24 @@ inline DatasetBuilder aSlice(int number, double z, double y = 0, double x = 0)
 
 using Images = std::vector<DatasetBuilder>;
 
+inline Vec3d patientPoint(const Mat4f& matrix, double column, double row, double slice)
+{
+    const auto along = [&](std::size_t i) {
+        const std::array<float, 16>& m = matrix.m;
+        return double(m[i]) * column + double(m[i + 1]) * row + double(m[i + 2]) * slice + double(m[i + 3]);
+    };
+    return {along(0), along(4), along(8)};
+}
+
+/// Where the matrix puts the slices farthest from where their images say they are [mm].
+inline double farthestOff(const Stack& stack)
+{
+    double most = 0;
+    for (int i = 0; i < stack.slices.size(); ++i)
+        most = qMax(most, length(patientPoint(stack.transformation, 0, 0, i) - stack.slices.at(i).position));
+    return most;
+}
+
 /// Slices numbered from 1, and others.
 inline Images atZ(const std::vector<double>& positions, const Images& others = {})
 {

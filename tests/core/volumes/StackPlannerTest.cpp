@@ -6,31 +6,12 @@
 #include <gtest/gtest.h>
 
 #include <cmath>
-#include <map>
 #include <tuple>
 
 using namespace Kdd;
 
 namespace
 {
-
-Vec3d patientPoint(const Mat4f& matrix, double column, double row, double slice)
-{
-    const auto along = [&](std::size_t i) {
-        const std::array<float, 16>& m = matrix.m;
-        return double(m[i]) * column + double(m[i + 1]) * row + double(m[i + 2]) * slice + double(m[i + 3]);
-    };
-    return {along(0), along(4), along(8)};
-}
-
-/// Where the matrix puts the slices farthest from where their images say they are [mm].
-double farthestOff(const Stack& stack)
-{
-    double most = 0;
-    for (int i = 0; i < stack.slices.size(); ++i)
-        most = qMax(most, length(patientPoint(stack.transformation, 0, 0, i) - stack.slices.at(i).position));
-    return most;
-}
 
 /// "every 2: 1 2 3; without 4;": distance and slices of each stack; frames of multi-frame images as "1.0".
 std::string planText(const StackPlan& plan)
@@ -155,68 +136,6 @@ TEST(StackPlanner, SlicesOfDifferentFramesOfReferenceAreStackedOnRequest)
     for (const LeftOutFrame& left : plan.leftOut)
         EXPECT_THAT(left.reason.toStdString(), testing::HasSubstr("Frame of Reference"));
     EXPECT_EQ(planText(series.plans(FrameOfReference::Ignored).front()), "every 1: 1 2 3 4 5 6; ");
-}
-
-/// Stacks by size and orientation, and images left out.
-using Counts = std::map<std::string, int>;
-
-const std::pair<const char*, Counts> kRealSeries[] = {
-    {"series/ct-phantom-rtstruct", {{"204x201x60 axial 0.977x0.977x3", 1}, {"left out", 1}}},
-    {"series/ct-philips-head", {{"512x512x28 axial 0.4512x0.4512x5", 1}, {"left out", 1}}},
-    {"series/geometry/gantry-tilt", {{"512x512x4 axial 0.418x0.418x4.851", 1}}},
-    {"series/geometry/non-isotropic-slopes", {{"64x28x4 axial 6.4x4x0.5", 1}}},
-    {"series/geometry/slice-orientation", {{"left out", 4}}},
-    {"series/mr-ge-localizer-epi",
-     {{"256x256x7 axial 0.9375x0.9375x15", 1},
-      {"256x256x7 sagittal 0.9375x0.9375x15", 1},
-      {"256x256x7 coronal 0.9375x0.9375x15", 1},
-      {"64x64x10 axial 3.75x3.75x3", 5}}},
-    {"series/mr-jpeg-lossless", {{"256x256x4 sagittal 1x1x1", 1}}},
-    {"series/mr-philips-asl-pr",
-     {{"128x128x16 axial 1.875x1.875x6", 1},
-      {"80x80x6 axial 3x3x6.6", 8},
-      {"80x80x14 axial 3x3x6", 1},
-      {"left out", 2}}},
-    {"series/mr-philips-epi", {{"64x64x9 axial 3.75x3.75x8", 3}}},
-    {"series/mr-siemens-csa-t1sag", {{"256x256x35 sagittal 1.016x1.016x4.8", 1}}},
-    {"series/mr-siemens-mosaic", {{"left out", 8}}},
-    {"series/pet-seg", {{"128x128x299 axial 3.538x3.538x3.375", 1}, {"left out", 1}}},
-    {"multiframe/enhanced-ct", {{"23x38x3 axial 0.7x0.7x2.5", 1}, {"left out", 2}}},
-    {"multiframe/enhanced-mr",
-     {{"64x64x6 axial 3.375x3.375x2.4", 4},
-      {"256x256x15 sagittal 0.8203x0.8203x6", 1},
-      {"64x64x32 axial 4x4x4", 2},
-      {"left out", 263}}},
-};
-
-std::string sizeText(const Stack& stack)
-{
-    const StackFrame& first = stack.slices.first();
-    const Vec3d normal = first.normal();
-    const bool isAxial = std::fabs(normal.z) > 0.8;
-    const char* plane = isAxial ? "axial" : std::fabs(normal.y) > 0.8 ? "coronal" : "sagittal";
-    return QString::asprintf("%dx%dx%d %s %.4gx%.4gx%.4g", stack.dims.x, stack.dims.y, stack.dims.z, plane,
-                             first.columnSpacing, first.rowSpacing, stack.sliceSpacing)
-        .toStdString();
-}
-
-TEST(StackPlanner, StacksRealSeries)
-{
-    if (realFilesFolder().isEmpty())
-        GTEST_SKIP() << "KDD_TEST_DATA is not set";
-    for (const auto& [folder, expected] : kRealSeries) {
-        const StackSeries images(realFiles(folder));
-        Counts counts;
-        for (const StackPlan& plan : images.plans()) {
-            for (const Stack& stack : plan.stacks) {
-                ++counts[sizeText(stack)];
-                EXPECT_LT(farthestOff(stack), 0.02) << folder;
-            }
-            if (!plan.leftOut.isEmpty())
-                counts["left out"] += plan.leftOut.size();
-        }
-        EXPECT_EQ(counts, expected) << folder;
-    }
 }
 
 }  // namespace

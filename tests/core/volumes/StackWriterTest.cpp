@@ -148,6 +148,8 @@ TEST_F(StackWriter, KeepsThePhysicalValuesOfRealSeries)
         for (const StackPlan& plan : series.plans()) {
             for (const Stack& stack : plan.stacks)
                 EXPECT_LE(worstError(stack), error) << folder;
+            for (const Stack& stack : plan.stacks)
+                EXPECT_LT(farthestOff(stack), 0.02) << folder;
         }
     }
 }

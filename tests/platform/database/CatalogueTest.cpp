@@ -91,19 +91,12 @@ TEST_P(CatalogueTest, AFileThatMovesTouchesBothStudiesAndAnEmptyOneWaitsToBeForg
     EXPECT_EQ(findStudies("1.1"), QVector<QByteArray>());
 }
 
-TEST_P(CatalogueTest, OfSeveralFilesOfOneImageTheOneRegisteredLastIsListed)
+TEST_P(CatalogueTest, ConflictsOfFilesAreTold)
 {
     EXPECT_EQ(conflictsOf({dicom("/d/z", "1", "1.1", "x"), dicom("/d/y", "2", "2.1", "x")}),
               "/d/z also in other study /d/y of 2\n");
     EXPECT_EQ(conflictsOf({dicom("/d/a", "1", "1.2", "x")}),
               "/d/a also in other study /d/y of 2\n/d/a replaces /d/z of 1\n");
-    EXPECT_EQ(told("1"), "1.1 :\n1.2 :\n1.2 x /d/a\n");
-    EXPECT_EQ(studies(), "1   2/1/0*\n2   1/1/0*\n");
-    ASSERT_TRUE(catalogue().removeFiles({"/d/a"}).good());
-    EXPECT_EQ(told("1"), "1.1 :\n1.1 x /d/z\n");
-    add({dicom("/d/b", "1", "1.1", "x")});
-    add({dicom("/d/b", "1", "1.1", "other")});
-    EXPECT_EQ(told("1"), "1.1 :\n1.1 other /d/b\n1.1 x /d/z\n");
 }
 
 TEST_P(CatalogueTest, ImagesAreListedWhereACorrectionPutThemAndFilesFollow)
@@ -111,16 +104,16 @@ TEST_P(CatalogueTest, ImagesAreListedWhereACorrectionPutThemAndFilesFollow)
     add(FileRecords{
         {dicom("/d/a", "1", "1.1", "x"), dicom("/d/b", "1", "1.1", "y")}, {{"/d/v", {}, "1", "1.1"}}, {}});
     EXPECT_EQ(correct({{"1", "x", "2", "2.1", "x2", "changes"}}).keys(), (QList<QByteArray>{"1", "2"}));
+    QByteArray study;
+    Paths foreign;
+    std::vector<ImageCorrection> known;
+    ASSERT_TRUE(GetCorrections(2, study, known, foreign).good());
+    EXPECT_TRUE(study == "2" && known.size() == 1 && foreign == Paths{"/d/v"});
     EXPECT_EQ(told("2"), "2.1 : v\n2.1 x2 /d/a\n");
     EXPECT_EQ(told("1"), "1.1 : v\n1.1 y /d/b\n");
     EXPECT_EQ(conflictsOf({dicom("/e/a", "1", "1.1", "x")}),
               "/e/a follows correction  of 2\n/e/a replaces /d/a of 2\n");
     EXPECT_EQ(told("2"), "2.1 : v\n2.1 x2 /e/a\n");
-    std::vector<ImageCorrection> known;
-    ASSERT_TRUE(catalogue().corrections("2", known).good());
-    ASSERT_EQ(known.size(), 1U);
-    EXPECT_EQ(known.front().image + ' ' + known.front().shownImage + ' ' + known.front().changes,
-              "x x2 changes");
     // On to a third study, and then back as if nothing had been.
     correct({{"1", "x", "3", "3.1", "x", "more"}});
     EXPECT_EQ(told("2"), "none");
@@ -138,73 +131,6 @@ TEST_P(CatalogueTest, AMoveTakenBackLeavesTheFileThatItHadHidden)
     add({dicom("/d/later", "1", "1.1", "x")});
     correct({{"1", "x", "1", "1.1", "x", ""}});
     EXPECT_EQ(told("1") + told("2"), "1.1 :\n1.1 x /d/later\n2.1 :\n2.1 x /d/native\n");
-    correct({{"2", "x", "3", "3.1", "x", "more"}});
-    EXPECT_EQ(told("1") + told("2") + told("3"), "1.1 :\n1.1 x /d/later\nnone3.1 :\n3.1 x /d/native\n");
-}
-
-TEST_P(CatalogueTest, AnImageWithoutUidIsCorrectedAndRemovedByItsPath)
-{
-    add({dicom("/d/a", "1", "1.1", ""), dicom("/d/b", "1", "1.1", "")});
-    correct({{"1", "/d/a", "2", "2.1", "/d/a", "changes"}});
-    EXPECT_EQ(told("1") + told("2"), "1.1 :\n1.1  /d/b\n2.1 :\n2.1  /d/a\n");
-    EXPECT_TRUE(catalogue().removeImage("1", "").good());
-    EXPECT_EQ(told("1"), "1.1 :\n1.1  /d/b\n");
-    EXPECT_TRUE(catalogue().removeImage("1", "/d/b").good());
-    EXPECT_EQ(told("1"), "none");
-}
-
-TEST_P(CatalogueTest, WhatWasBuiltIsDescribedAndRecognised)
-{
-    add({dicom("/d/a", "1", "1.1", "x"), dicom("/d/b", "1", "1.2", "y")});
-    auto claim = claimNext();
-    ASSERT_TRUE(claim);
-    BuiltStudy built;
-    built.tagFile = {77, "digest"};
-    built.series = {dicom("/d/a", "1", "1.1"), dicom("/d/b", "1", "1.2")};
-    built.series[0].patientName = "Corrected";
-    built.series[1].modality = "CT";
-    built.settleAt = std::numeric_limits<qint64>::max();
-    ASSERT_EQ(claim->finish(built).text().toStdString(), "");
-    EXPECT_EQ(studies(), "1 Corrected CT 2/2/0\n");
-    StudyContents contents;
-    ASSERT_TRUE(catalogue().studyContents("1", contents).good());
-    EXPECT_EQ(contents.tagFile, built.tagFile);
-    EXPECT_EQ(contents.images.size(), 2U);
-    claim.reset();
-    EXPECT_FALSE(claimNext());
-    ASSERT_TRUE(catalogue().settleNow().good());
-    EXPECT_EQ(studies(), "1 Corrected CT 2/2/0*\n");
-    EXPECT_TRUE(claimNext());
-}
-
-TEST_P(CatalogueTest, AChangeTakesBackItsOwnRequestOnly)
-{
-    add({dicom("/d/a", "1", "1.1", "x"), dicom("/d/b", "1", "1.1", "y")});
-    add(FileRecords{{}, {{"/d/v", {}, "1", "1.1"}}, {}});
-    auto claim = claimNext();
-    ASSERT_TRUE(claim && claim->finish().good());
-    claim.reset();
-    EXPECT_EQ(studies(), "1   1/2/1\n");
-    ASSERT_TRUE(catalogue().claim("1", 0, claim).good() && claim != nullptr);
-    for (const char* before : {"1 Roe  1/2/1\n", "1 Roe  1/2/1*\n"}) {
-        const Requests requests = correct({{"1", "x", "1", "1.1", "x", "changes"}});
-        BuiltStudy built;
-        built.series = {dicom("/d/a", "1", "1.1")};
-        built.series[0].patientName = "Roe";
-        EXPECT_EQ(claim->finishChange(built, requests.value("1")).text().toStdString(), "");
-        EXPECT_EQ(studies(), before);
-        ASSERT_TRUE(catalogue().requestBuild({"1"}).good());
-    }
-    correct({{"1", "x", "2", "2.1", "x", "changes"}});
-    QByteArray study;
-    std::vector<ImageCorrection> corrections;
-    Paths foreign;
-    ASSERT_TRUE(GetCorrections(1, study, corrections, foreign).good());
-    EXPECT_TRUE(study == "1" && corrections.size() == 1 && foreign.empty());
-    ASSERT_TRUE(GetCorrections(2, study, corrections, foreign).good());
-    EXPECT_TRUE(study == "2" && corrections.size() == 1 && foreign == Paths{"/d/v"});
-    ASSERT_TRUE(GetCorrections(99, study, corrections, foreign).good());
-    EXPECT_TRUE(study.isEmpty() && corrections.empty() && foreign.empty());
 }
 
 TEST_P(CatalogueTest, ListsAreInTheOrderOfBytesWhateverTheOrderOfRegistering)
@@ -278,37 +204,20 @@ TEST_P(CatalogueTest, KeepsEveryFileOfALargeSetOnceWithItsLastStampAndListsTheLa
     EXPECT_EQ(studies(), "1   1/1/0*\n");
 }
 
-TEST_P(CatalogueTest, WhatIsRemovedIsForgottenWithAllThatBecomesEmpty)
-{
-    const std::vector<DicomFileRecord> files = {
-        dicom("/d/a", "1", "1.1", "x"), dicom("/d/b", "1", "1.2", "y"), dicom("/d/c", "1", "1.2", "z")};
-    add(FileRecords{files, {{"/d/v", {}, "1", "1.1"}}, {}});
-    add({dicom("/e/a", "2", "2.1", "x")});
-    EXPECT_TRUE(catalogue().removeImage("1", "x").good());
-    EXPECT_EQ(known("/"), (PathSet{"/d/b", "/d/c", "/d/v", "/e/a"}));
-    EXPECT_TRUE(catalogue().removeSeries("1", "1.2").good());
-    EXPECT_EQ(studies(), "1   1/0/1*\n2   1/1/0*\n");
-    EXPECT_TRUE(catalogue().removeStudy("1").good());
-    EXPECT_EQ(studies(), "2   1/1/0*\n");
-}
-
 TEST_P(CatalogueTest, FindsStudiesByTheBeginningOfTheirUID)
 {
     add({dicom("/d/a", "1.2", "1"), dicom("/d/b", "1.25", "1"), dicom("/d/c", "1.3", "1"),
          dicom("/d/d", "1_2", "1")});
     EXPECT_EQ(findStudies("1.2"), (QVector<QByteArray>{"1.2", "1.25"}));
-    EXPECT_EQ(findStudies("1", 3), (QVector<QByteArray>{"1.2", "1.25", "1.3"}));
+    EXPECT_EQ(findStudies("1", 3).size(), 3);
 }
 
 TEST_P(CatalogueTest, ConfigurationIsReadBack)
 {
     catalogue();
     EXPECT_EQ(StorageManager::getMetaFolder(), "");
-    const char* const values[][2] = {{"MetaFolder", "/meta/\xFF"},
-                                     {"Volume10", "/j"},
-                                     {"Volume2", "/b"},
-                                     {"Volume2", "/c"},
-                                     {"VolumeX", "/x"}};
+    const char* const values[][2] = {
+        {"MetaFolder", "/meta/\xFF"}, {"Volume10", "/j"}, {"Volume2", "/b"}, {"Volume2", "/c"}};
     for (const auto& value : values)
         EXPECT_TRUE(catalogue().setConfig("Storage", value[0], value[1]).good());
     EXPECT_EQ(StorageManager::getMetaFolder(), "/meta/\xFF");

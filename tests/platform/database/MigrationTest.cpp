@@ -29,8 +29,10 @@ const char* const kFirstTables[] = {
     " PRIMARY KEY (section, name))",
     "INSERT INTO study (uid, is_described, patient_name) VALUES ('1', 1, 'Doe')",
     "INSERT INTO series (study_id, uid, modality) VALUES (1, '1.1', 'CT')",
-    "INSERT INTO file VALUES ({/d/a}, 5, 7, 1, 1, 'x'), ({/d/b}, 5, 7, 1, 1, 'x'), ({/d/c}, 5, 7, 1, 1, ''),"
-    " ({/d/d}, 5, 7, 1, 1, ''), ({/d/v}, 5, 7, 2, 1, ''), ({/d/o}, 5, 7, 0, NULL, '')",
+    "INSERT INTO file VALUES (CAST('/d/a' AS {bytes}), 5, 7, 1, 1, 'x'), (CAST('/d/b' AS {bytes}), 5, 7, 1, "
+    "1, 'x'),"
+    " (CAST('/d/c' AS {bytes}), 5, 7, 1, 1, ''), (CAST('/d/d' AS {bytes}), 5, 7, 1, 1, ''),"
+    " (CAST('/d/v' AS {bytes}), 5, 7, 2, 1, ''), (CAST('/d/o' AS {bytes}), 5, 7, 0, NULL, '')",
     "INSERT INTO build_request (study_id) VALUES (1)",
 };
 
@@ -47,11 +49,6 @@ protected:
                                  : QStringLiteral("BIGINT GENERATED ALWAYS AS IDENTITY PRIMARY KEY"));
             sql.replace(QLatin1String("{bytes}"),
                         isSqlite ? QStringLiteral("BLOB") : QStringLiteral("BYTEA"));
-            for (const char* path : {"/d/a", "/d/b", "/d/c", "/d/d", "/d/v", "/d/o"}) {
-                const QString hex = QString::fromLatin1(QByteArray(path).toHex());
-                sql.replace(QLatin1Char('{') + QLatin1String(path) + QLatin1Char('}'),
-                            isSqlite ? QStringLiteral("x'%1'").arg(hex) : QStringLiteral("'\\x%1'").arg(hex));
-            }
             execute(sql.toUtf8().constData());
         }
     }

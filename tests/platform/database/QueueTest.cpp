@@ -1,13 +1,6 @@
 #include "DatabaseFixture.h"
-
-#include <sys/prctl.h>
-#include <sys/wait.h>
-#include <unistd.h>
-
-#include <atomic>
-#include <csignal>
-#include <functional>
-#include <thread>
+#include "support/Process.h"
+#include "support/Threads.h"
 
 using namespace Kxg;
 
@@ -35,30 +28,6 @@ protected:
 };
 
 INSTANTIATE_TEST_SUITE_P(Engines, QueueTest, testing::Values(Engine::Sqlite, Engine::Postgres), engineName);
-
-void runInThreads(int count, const std::function<void()>& life)
-{
-    std::vector<std::thread> threads;
-    for (int i = 0; i < count; ++i)
-        threads.emplace_back(life);
-    for (std::thread& thread : threads)
-        thread.join();
-}
-
-/// Runs `life` in another process and waits until that stops itself.
-pid_t stoppedProcess(const std::function<void()>& life)
-{
-    const pid_t pid = ::fork();
-    if (pid == 0) {
-        ::prctl(PR_SET_PDEATHSIG, SIGKILL);
-        life();
-        ::_exit(1);
-    }
-    int status = 0;
-    EXPECT_EQ(::waitpid(pid, &status, WUNTRACED), pid);
-    EXPECT_TRUE(WIFSTOPPED(status));
-    return pid;
-}
 
 TEST_P(QueueTest, TheLongestWaitingFreeStudyIsNext)
 {
@@ -117,31 +86,30 @@ TEST_P(QueueTest, ThreadsNeverHoldOneStudyTogetherAndLeaveNone)
     addStudies(kStudies);
     std::atomic<int> holders[kStudies + 1] = {};
     std::atomic<int> built{0};
-    const auto life = [&] {
+    Kdd::onThreads(4, [&](int) {
         const auto own = open();
         for (std::unique_ptr<StudyClaim> claim; own->claimNext({}, claim).good() && claim; claim.reset()) {
             EXPECT_EQ(++holders[claim->studyId()], 1);
             built += claim->finish().good() ? 1 : 0;
             --holders[claim->studyId()];
         }
-    };
-    runInThreads(4, life);
+    });
     EXPECT_EQ(built, kStudies);
 }
 
 TEST_P(QueueTest, AKilledProcessGivesItsStudyBack)
 {
     addStudies(1);
-    const pid_t holder = stoppedProcess([this] {
-        const auto own = open();
+    {
+        std::unique_ptr<Catalogue> own;
         std::unique_ptr<StudyClaim> claim;
-        if (own->claimNext({}, claim).good() && claim)
-            ::raise(SIGSTOP);
-    });
-    EXPECT_FALSE(canClaim("1"));
-    EXPECT_FALSE(claimNext());
-    ::kill(holder, SIGKILL);
-    ::waitpid(holder, nullptr, 0);
+        const Kdd::StoppedProcess holder([&] {
+            own = open();
+            return own->claimNext({}, claim).good() && claim;
+        });
+        EXPECT_FALSE(canClaim("1"));
+        EXPECT_FALSE(claimNext());
+    }
     EXPECT_TRUE(canClaim("1", 20000));
     EXPECT_EQ(studies(), "1   1/1/0*\n");
 }
@@ -149,7 +117,7 @@ TEST_P(QueueTest, AKilledProcessGivesItsStudyBack)
 TEST_P(QueueTest, AllWhoMakeTheDatabaseAtOnceSucceed)
 {
     std::atomic<int> opened{0};
-    runInThreads(8, [&] { opened += open() ? 1 : 0; });
+    Kdd::onThreads(8, [&](int) { opened += open() ? 1 : 0; });
     EXPECT_EQ(opened, 8);
     addStudies(1);
 }

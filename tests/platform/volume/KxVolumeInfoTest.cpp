@@ -1,12 +1,8 @@
-#include "PixelDataset.h"
-#include "platform/volumefile/OrlanMesh.h"
-#include "platform/volumefile/OrlanMeshWriter.h"
+#include "Pixels.h"
+#include "platform/volumefile/VolumeFileBuilder.h"
+#include "support/FileContent.h"
 
-#include <QFile>
 #include <QProcess>
-#include <QTemporaryDir>
-
-#include <gtest/gtest.h>
 
 #include <limits>
 
@@ -15,7 +11,7 @@ using namespace Kdd;
 namespace
 {
 
-std::shared_ptr<KxVolumeInfo> show(const PixelDataset& image, int width = 0, int height = 0)
+std::shared_ptr<KxVolumeInfo> show(const DatasetBuilder& image, int width = 0, int height = 0)
 {
     Result result;
     auto info =
@@ -24,35 +20,35 @@ std::shared_ptr<KxVolumeInfo> show(const PixelDataset& image, int width = 0, int
     return info;
 }
 
-PixelDataset ramp()
+DatasetBuilder ramp()
 {
-    return PixelDataset(1, 4, 16).words({0, 100, 1000, 2000});
+    return aPicture(1, 4, 16).words({0, 100, 1000, 2000});
 }
 
-PixelDataset signedRamp()
+DatasetBuilder signedRamp()
 {
-    return PixelDataset(1, 4, 16)
+    return aPicture(1, 4, 16)
         .with(DCM_PixelRepresentation, "1")
         .words({0xf830, 0xff9c, 0, 1000});  // -2000, -100
 }
 
-PixelDataset lookUp(const std::vector<Uint16>& descriptor, const std::vector<Uint16>& entries)
+DatasetBuilder lookUp(const std::vector<Uint16>& descriptor, const std::vector<Uint16>& entries)
 {
-    return PixelDataset::item().numbers(DCM_LUTDescriptor, descriptor).words(entries, DCM_LUTData);
+    return anItem().numbers(DCM_LUTDescriptor, descriptor).words(entries, DCM_LUTData);
 }
 
 /// Attributes of a frame as enhanced images keep them.
-PixelDataset group(const DcmTagKey& sequence, const PixelDataset& attributes)
+DatasetBuilder group(const DcmTagKey& sequence, const DatasetBuilder& attributes)
 {
-    return PixelDataset::item().withItem(sequence, attributes);
+    return anItem().withItem(sequence, attributes);
 }
 
-PixelDataset window(const char* center, const char* width)
+DatasetBuilder window(const char* center, const char* width)
 {
-    return PixelDataset::item().with(DCM_WindowCenter, center).with(DCM_WindowWidth, width);
+    return anItem().with(DCM_WindowCenter, center).with(DCM_WindowWidth, width);
 }
 
-PixelDataset rampInWindow(const char* center, const char* width)
+DatasetBuilder rampInWindow(const char* center, const char* width)
 {
     return ramp().with(DCM_WindowCenter, center).with(DCM_WindowWidth, width);
 }
@@ -60,7 +56,7 @@ PixelDataset rampInWindow(const char* center, const char* width)
 struct RangeCase
 {
     const char* name;
-    PixelDataset image;
+    DatasetBuilder image;
     double lowest;
     double highest;
 };
@@ -96,7 +92,7 @@ const RangeCase kRanges[] = {
     {"RescaledAsAllFramesAre",
      ramp().withItem(DCM_SharedFunctionalGroupsSequence,
                      group(DCM_PixelValueTransformationSequence,
-                           PixelDataset::item().with(DCM_RescaleSlope, "3").with(DCM_RescaleIntercept, "1"))),
+                           anItem().with(DCM_RescaleSlope, "3").with(DCM_RescaleIntercept, "1"))),
      1, 6001},
 };
 
@@ -110,25 +106,19 @@ TEST(KxVolumeInfo, TakesTheRangeFromWhereTheImageTellsIt)
     }
 }
 
-TEST(KxVolumeInfo, AppliesTablesToPixels)
-{
-    const auto modality = ramp().withItem(DCM_ModalityLUTSequence, lookUp({3, 99, 16}, {7, 500, 900}));
-    EXPECT_EQ(numbersOf(*show(modality)), (QVector<double>{7, 500, 900, 900}));
-}
-
 TEST(KxVolumeInfo, SpreadsARangeOfFewSteps)
 {
-    const auto info = show(PixelDataset(1, 4, 1).bytes({0x0a, 0}));  // 0 1 0 1
+    const auto info = show(aPicture(1, 4, 1).bytes({0x0a, 0}));  // 0 1 0 1
     EXPECT_EQ(numbersOf(*info), (QVector<double>{0, 65535, 0, 65535}));
     EXPECT_EQ(info->highestValue(), 65535);
-    const auto mask = PixelDataset(2, 4, 1).bytes({0x0b, 0});  // 1 1 0 1 above 0 0 0 0
+    const auto mask = aPicture(2, 4, 1).bytes({0x0b, 0});  // 1 1 0 1 above 0 0 0 0
     EXPECT_EQ(numbersOf(*show(mask, 2, 1)), (QVector<double>{32767.5, 16383.75}));
 }
 
 TEST(KxVolumeInfo, FloatPixelsWithoutValueAreBlack)
 {
     const float values[] = {-100, std::numeric_limits<float>::quiet_NaN(), 700, 9999};
-    auto image = PixelDataset(1, 4, 32);
+    auto image = aPicture(1, 4, 32);
     image.dataset().putAndInsertFloat32Array(DcmTag(DCM_FloatPixelData, EVR_OF), values, 4);
     image.dataset().putAndInsertFloat32(DCM_FloatPixelPaddingValue, 9999);
     const auto info = show(image);
@@ -139,7 +129,7 @@ TEST(KxVolumeInfo, FloatPixelsWithoutValueAreBlack)
 
 TEST(KxVolumeInfo, ReducesByMeansOfWholeBlocks)
 {
-    const auto image = PixelDataset(2, 5, 8).bytes({10, 20, 100, 110, 9, 30, 43, 120, 131, 9});
+    const auto image = aPicture(2, 5, 8).bytes({10, 20, 100, 110, 9, 30, 43, 120, 131, 9});
     EXPECT_EQ(numbersOf(*show(image, 2, 1)), (QVector<double>{26, 115}));
     EXPECT_EQ(show(image, 3, 1)->width(), 5);  // halves would be below three
 }
@@ -171,10 +161,9 @@ TEST(KxVolumeInfo, LowValuesAreWhiteWhereTheImageSaysSo)
     EXPECT_FALSE(show(ramp())->isInverted());
 }
 
-PixelDataset paletteImage(const std::vector<Uint16>& descriptor, const std::vector<Uint16>& red)
+DatasetBuilder paletteImage(const std::vector<Uint16>& descriptor, const std::vector<Uint16>& red)
 {
-    auto image =
-        PixelDataset(1, 3, 8).with(DCM_PhotometricInterpretation, "PALETTE COLOR").bytes({0, 5, 9, 0});
+    auto image = aPicture(1, 3, 8).with(DCM_PhotometricInterpretation, "PALETTE COLOR").bytes({0, 5, 9, 0});
     image.numbers(DCM_RedPaletteColorLookupTableDescriptor, descriptor);
     image.numbers(DCM_GreenPaletteColorLookupTableDescriptor, descriptor);
     image.numbers(DCM_BluePaletteColorLookupTableDescriptor, descriptor);
@@ -204,7 +193,7 @@ TEST(KxVolumeInfo, OfManyFramesAnEmptyOneIsNotShown)
 {
     std::vector<Uint8> values(24, 0);
     values[11] = 200;  // the second pixel of the sixth of twelve frames; the middle one is the seventh
-    const auto info = show(PixelDataset(1, 2, 8).with(DCM_NumberOfFrames, "12").bytes(values));
+    const auto info = show(aPicture(1, 2, 8).with(DCM_NumberOfFrames, "12").bytes(values));
     EXPECT_EQ(numbersOf(*info), (QVector<double>{0, 200}));
 }
 
@@ -217,13 +206,12 @@ TEST(KxVolumeInfo, OfAVideoShowsAFrameAtThreeTenths)
     ASSERT_EQ(QProcess::execute(QStringLiteral("ffmpeg"), QString::fromLatin1(fade).split(QLatin1Char(' '))
                                                               << path),
               0);
-    QFile video(path);
-    ASSERT_TRUE(video.open(QIODevice::ReadOnly));
-    const QByteArray head = video.read(1000);  // the fragments of a video are cut anywhere
+    const QByteArray video = fileContent(path);
     auto* pixels = new DcmPixelData(DCM_PixelData);
+    // The fragments of a video are cut anywhere.
     pixels->putOriginalRepresentation(EXS_MPEG4HighProfileLevel4_1, nullptr,
-                                      sequenceOf({"", head, video.readAll()}).release());
-    const auto image = PixelDataset(64, 64, 8).colour("YBR_PARTIAL_420").with(DCM_NumberOfFrames, "40");
+                                      sequenceOf({"", video.left(1000), video.mid(1000)}).release());
+    const auto image = aPicture(64, 64, 8, "YBR_PARTIAL_420").with(DCM_NumberOfFrames, "40");
     image.dataset().insert(pixels);
     const auto info = show(image, 32, 32);
     ASSERT_TRUE(info);
@@ -232,43 +220,24 @@ TEST(KxVolumeInfo, OfAVideoShowsAFrameAtThreeTenths)
     EXPECT_NEAR(numbersOf(*info).at(2), 255 * 0.3, 12);  // blue
 }
 
-TEST(KxVolumeInfo, FramesFromElsewhereAreShownAsTheyAre)
-{
-    const TypedData2D frame{1, 1, 3, PrimitiveType::UInt8, QByteArray("\x01\x02\x03")};
-    const auto info = KxVolumeInfo::fromFrame(nullptr, frame);
-    EXPECT_EQ(numbersOf(*info), (QVector<double>{1, 2, 3}));
-    EXPECT_EQ(info->highestValue(), 255);
-    EXPECT_FALSE(
-        KxVolumeInfo::fromFrame(nullptr, TypedData2D{2, 1, 3, PrimitiveType::UInt8, QByteArray("abc")}));
-    EXPECT_FALSE(KxVolumeInfo::fromFrame(nullptr, TypedData2D()));
-}
-
 TEST(KxVolumeInfo, ShowsASliceOfAVolumeFileInItsWindow)
 {
-    const QTemporaryDir folder;
-    const QByteArray path = folder.filePath(QStringLiteral("volume.h5")).toLocal8Bit();
-    Result result;
-    const Lattice lattice{"Level0", {2, 1, 2}, PrimitiveType::UInt16, 1};
-    auto writer = OrlanMeshWriter::create(path, lattice, result);
-    ASSERT_TRUE(writer) << qPrintable(result.text());
-    writer->writeSlice(0, {2, 1, 1, PrimitiveType::UInt16, QByteArray(4, 0)});
-    writer->writeSlice(1, {2, 1, 1, PrimitiveType::UInt16, QByteArray("\x64\0\xe8\x03", 4)});  // 100, 1000
     ParamBundle parameters;
-    parameters.insert("BoundingBox", Parameter::ofReals({0, 2, 0, 4, 0, 1}));
+    parameters.insert("BoundingBox", Parameter::ofReals({0, 20, 0, 20, 0, 1}));
     parameters.insert("WindowCenter", Parameter::ofReals({500}));
     parameters.insert("WindowWidth", Parameter::ofReals({200}));
-    writer->writeParameters(parameters);
-    ASSERT_TRUE(writer->finish().good());
-
-    const auto mesh = OrlanMesh::read(path, result);
-    ASSERT_TRUE(mesh) << qPrintable(result.text());
-    const auto info = KxVolumeInfo::readVolumeInfo(*mesh, 8, 8, 1, result);
+    const VolumeFileBuilder file;
+    ASSERT_TRUE(file.write(aLattice(), parameters).good());
+    const auto mesh = file.open();
+    Result result;
+    const auto info = KxVolumeInfo::readVolumeInfo(*mesh, 0, 0, 2, result);
     ASSERT_TRUE(info) << qPrintable(result.text());
-    EXPECT_EQ(numbersOf(*info), (QVector<double>{100, 1000}));
+    EXPECT_EQ(numbersOf(*info), numbersOf(sliceOf(aLattice(), 2)));
     EXPECT_EQ(info->lowestValue(), 400);
     EXPECT_EQ(info->highestValue(), 600);
-    EXPECT_EQ(info->pixelAspectRatio(), 0.25F);
-    EXPECT_FALSE(KxVolumeInfo::readVolumeInfo(*mesh, 8, 8, 2, result));
+    EXPECT_EQ(info->pixelAspectRatio(), 0.5F);
+    EXPECT_FALSE(KxVolumeInfo::readVolumeInfo(*mesh, 0, 0, 3, result));
+    EXPECT_FALSE(KxVolumeInfo::fromFrame(nullptr, {2, 1, 3, PrimitiveType::UInt8, "abc"})) << "too few bytes";
 }
 
 }  // namespace

@@ -1,4 +1,4 @@
-#include "PixelDataset.h"
+#include "Pixels.h"
 #include "platform/volume/FragmentReader.h"
 #include "support/RealFiles.h"
 
@@ -158,17 +158,6 @@ TEST_F(RealPixels, HaveTheColoursThatAnotherDecoderShows)
         EXPECT_LT(differenceFromRendering(*shown->getDataset(), *info), reference ? 4 : 1.5) << name;
     }
     DcmRLEDecoderRegistration::cleanup();
-}
-
-TEST_F(RealPixels, ReducedJpeg2000IsNeverBelowWhatWasAskedFor)
-{
-    const auto file = load(inTransferSyntaxes("jpeg2000-lossless-90/MR4_J2KR"));  // 512 x 512
-    StoredFrame stored;
-    ASSERT_TRUE(readStoredFrame(*file->getDataset(), 0, 128, stored).good());
-    EXPECT_EQ(stored.reduction, 2);
-    EXPECT_EQ(stored.pixels.width, 128);
-    ASSERT_TRUE(readStoredFrame(*file->getDataset(), 0, 129, stored).good());
-    EXPECT_EQ(stored.pixels.height, 256);
 }
 
 /// A dataset of one frame, and the bytes of its fragment to damage.

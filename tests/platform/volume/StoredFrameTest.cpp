@@ -1,4 +1,4 @@
-#include "PixelDataset.h"
+#include "Pixels.h"
 #include "platform/volume/FragmentReader.h"
 #include "support/BytesRead.h"
 
@@ -11,7 +11,7 @@ using namespace Kdd;
 namespace
 {
 
-QVector<double> storedNumbers(const PixelDataset& image, int frame = 0)
+QVector<double> storedNumbers(const DatasetBuilder& image, int frame = 0)
 {
     StoredFrame stored;
     const Result result = readStoredFrame(image.dataset(), frame, 0, stored);
@@ -19,37 +19,35 @@ QVector<double> storedNumbers(const PixelDataset& image, int frame = 0)
     return numbersOf(stored.pixels);
 }
 
-PixelDataset twelveBits(const char* highBit)
+DatasetBuilder twelveBits(const char* highBit)
 {
-    return PixelDataset(1, 2, 16).with(DCM_BitsStored, "12").with(DCM_HighBit, highBit);
+    return aPicture(1, 2, 16).with(DCM_BitsStored, "12").with(DCM_HighBit, highBit);
 }
 
 struct LayoutCase
 {
     const char* name;
-    PixelDataset image;
+    DatasetBuilder image;
     QVector<double> expected;
 };
 
 const LayoutCase kLayouts[] = {
-    {"Bytes", PixelDataset(1, 2, 8).bytes({7, 255}), {7, 255}},
-    {"SignedBytes", PixelDataset(1, 2, 8).with(DCM_PixelRepresentation, "1").bytes({7, 255}), {7, -1}},
+    {"Bytes", aPicture(1, 2, 8).bytes({7, 255}), {7, 255}},
+    {"SignedBytes", aPicture(1, 2, 8).with(DCM_PixelRepresentation, "1").bytes({7, 255}), {7, -1}},
     {"OverlayBitsAbove", twelveBits("11").words({0xf123, 0x1fff}), {0x123, 0xfff}},
     {"SignedTwelveBits",
      twelveBits("11").with(DCM_PixelRepresentation, "1").words({0x0fff, 0x07ff}),
      {-1, 2047}},
     {"HighBitAtTheTop", twelveBits("15").words({0x123f, 0xfff0}), {0x123, 0xfff}},
     {"ImpossibleHighBit", twelveBits("40").words({0x123, 0xfff}), {0x123, 0xfff}},
-    {"MoreStoredThanAllocated",
-     PixelDataset(1, 2, 16).with(DCM_BitsStored, "99").words({1, 65535}),
-     {1, 65535}},
-    {"ThirtyTwoBits", PixelDataset(1, 1, 32).words({0x0001, 0x8000}), {2147483649.0}},
+    {"MoreStoredThanAllocated", aPicture(1, 2, 16).with(DCM_BitsStored, "99").words({1, 65535}), {1, 65535}},
+    {"ThirtyTwoBits", aPicture(1, 1, 32).words({0x0001, 0x8000}), {2147483649.0}},
     {"Planes",
-     PixelDataset(1, 2, 8).colour("RGB").with(DCM_PlanarConfiguration, "1").bytes({1, 2, 3, 4, 5, 6}),
+     aPicture(1, 2, 8, "RGB").with(DCM_PlanarConfiguration, "1").bytes({1, 2, 3, 4, 5, 6}),
      {1, 3, 5, 2, 4, 6}},
-    {"SharedChroma", PixelDataset(1, 2, 8).colour("YBR_FULL_422").bytes({1, 2, 3, 4}), {1, 3, 4, 2, 3, 4}},
+    {"SharedChroma", aPicture(1, 2, 8, "YBR_FULL_422").bytes({1, 2, 3, 4}), {1, 3, 4, 2, 3, 4}},
     {"ChromaNotSharedAfterAll",
-     PixelDataset(1, 2, 8).colour("YBR_FULL_422").bytes({1, 2, 3, 4, 5, 6}),
+     aPicture(1, 2, 8, "YBR_FULL_422").bytes({1, 2, 3, 4, 5, 6}),
      {1, 2, 3, 4, 5, 6}},
 };
 
@@ -62,7 +60,7 @@ TEST(StoredFrame, UnpacksEveryLayout)
 TEST(StoredFrame, FramesOfSingleBitsNeedNotBeginAtAByte)
 {
     // Three frames of five pixels: 10101, 01010, 11100, the first pixel in the lowest bit.
-    const auto image = PixelDataset(1, 5, 1).with(DCM_NumberOfFrames, "3").bytes({0x55, 0x1d});
+    const auto image = aPicture(1, 5, 1).with(DCM_NumberOfFrames, "3").bytes({0x55, 0x1d});
     EXPECT_EQ(storedNumbers(image, 0), (QVector<double>{1, 0, 1, 0, 1}));
     EXPECT_EQ(storedNumbers(image, 1), (QVector<double>{0, 1, 0, 1, 0}));
     EXPECT_EQ(storedNumbers(image, 2), (QVector<double>{1, 1, 1, 0, 0}));
@@ -71,22 +69,22 @@ TEST(StoredFrame, FramesOfSingleBitsNeedNotBeginAtAByte)
 struct Refusal
 {
     const char* name;
-    PixelDataset image;
+    DatasetBuilder image;
     int frame;
     const char* reason;
 };
 
 const Refusal kRefusals[] = {
-    {"NoPixels", PixelDataset(1, 1, 8), 0, "There are no pixel data"},
-    {"NoRows", PixelDataset(0, 1, 8).bytes({1, 2}), 0, "1 columns and 0 rows are no size of an image"},
-    {"Huge", PixelDataset(65535, 65535, 8).bytes({1, 2}), 0,
+    {"NoPixels", aPicture(1, 1, 8), 0, "There are no pixel data"},
+    {"NoRows", aPicture(0, 1, 8).bytes({1, 2}), 0, "1 columns and 0 rows are no size of an image"},
+    {"Huge", aPicture(65535, 65535, 8).bytes({1, 2}), 0,
      "65535 columns and 65535 rows are no size of an image"},
-    {"TooShort", PixelDataset(2, 2, 16).words({1, 2, 3}), 0, "Pixel data of 6 bytes end before frame 1 does"},
-    {"FrameBeyond", PixelDataset(1, 2, 8).bytes({1, 2}), 1, "There is no frame 2 among 1"},
-    {"FramesClaimed", PixelDataset(1, 2, 8).with(DCM_NumberOfFrames, "2147483647").bytes({1, 2}), 2147483646,
+    {"TooShort", aPicture(2, 2, 16).words({1, 2, 3}), 0, "Pixel data of 6 bytes end before frame 1 does"},
+    {"FrameBeyond", aPicture(1, 2, 8).bytes({1, 2}), 1, "There is no frame 2 among 1"},
+    {"FramesClaimed", aPicture(1, 2, 8).with(DCM_NumberOfFrames, "2147483647").bytes({1, 2}), 2147483646,
      "Pixel data of 2 bytes end before frame 2147483647 does"},
-    {"OddBits", PixelDataset(1, 2, 12).bytes({1, 2, 3, 4}), 0, "Pixels of 12 bits cannot be decoded"},
-    {"OddSamples", PixelDataset(1, 2, 8).with(DCM_SamplesPerPixel, "4").bytes({1, 2}), 0,
+    {"OddBits", aPicture(1, 2, 12).bytes({1, 2, 3, 4}), 0, "Pixels of 12 bits cannot be decoded"},
+    {"OddSamples", aPicture(1, 2, 8).with(DCM_SamplesPerPixel, "4").bytes({1, 2}), 0,
      "Pixels of 4 samples cannot be decoded"},
 };
 
@@ -102,14 +100,13 @@ TEST(StoredFrame, RefusesWhatCannotBeAnImage)
 TEST(StoredFrame, ReadsOneFrameOfAFileAndNoMore)
 {
     constexpr int kSide = 256;
-    constexpr int kFrames = 24;
     const QTemporaryDir folder;
     const QByteArray path = folder.filePath(QStringLiteral("loop.dcm")).toLocal8Bit();
-    auto image = PixelDataset(kSide, kSide, 16).with(DCM_NumberOfFrames, QByteArray::number(kFrames));
+    auto image = aPicture(kSide, kSide, 16).with(DCM_NumberOfFrames, "24");
     image.with(DCM_SOPClassUID, UID_UltrasoundMultiframeImageStorage).with(DCM_SOPInstanceUID, "1.2");
-    std::vector<Uint16> values(size_t(kSide) * kSide * kFrames);
-    for (size_t i = 0; i < values.size(); ++i)
-        values[i] = static_cast<Uint16>(i / (size_t(kSide) * kSide));
+    std::vector<Uint16> values;
+    for (Uint16 frame = 0; frame < 24; ++frame)
+        values.insert(values.end(), size_t(kSide) * kSide, frame);
     ASSERT_TRUE(DcmFileFormat(&image.words(values).dataset())
                     .saveFile(path.constData(), EXS_LittleEndianExplicit)
                     .good());
@@ -154,19 +151,6 @@ TEST(FragmentReader, FindsTheFragmentsOfAFrame)
         EXPECT_EQ(result.good(), !fragments.expected.isEmpty()) << fragments.name;
         EXPECT_EQ(bytes, fragments.expected) << fragments.name;
     }
-}
-
-TEST(FragmentSource, ReadsAcrossFragmentsAsOneStretch)
-{
-    const auto sequence = sequenceOf({"", "abcd", "", "efghij"});
-    FragmentSource source(*sequence);
-    QByteArray all;
-    char buffer[3];
-    for (qint64 got = 0; (got = source.read(all.size(), buffer, sizeof buffer)) > 0;)
-        all.append(buffer, static_cast<int>(got));
-    EXPECT_EQ(all, "abcdefghij");
-    EXPECT_EQ(source.size(), 10);
-    EXPECT_EQ(source.read(-1, buffer, 1), -1);
 }
 
 }  // namespace

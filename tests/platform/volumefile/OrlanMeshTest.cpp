@@ -2,13 +2,12 @@
 
 #include "platform/volumefile/VolumeFileBuilder.h"
 #include "support/BytesRead.h"
+#include "support/Process.h"
+#include "support/Threads.h"
 
 #include <gtest/gtest.h>
-#include <sys/resource.h>
 
-#include <csignal>
 #include <limits>
-#include <thread>
 
 using namespace Kdd;
 
@@ -119,13 +118,10 @@ TEST(OrlanMesh, IsReadOnSeveralThreads)
     const VolumeFileBuilder file;
     const Lattice lattice = aLattice();
     ASSERT_TRUE(file.write(lattice).good());
-    const auto work = [&] {
+    onThreads(2, [&](int) {
         for (int i = 0; i < 20; ++i)
             expectAllSlices(*(i % 2 != 0 ? file.openInMemory() : file.open()), lattice);
-    };
-    std::thread other(work);
-    work();
-    other.join();
+    });
 }
 
 TEST(OrlanMeshWriter, LeavesNothingWhenItIsNotFinished)
@@ -148,15 +144,11 @@ TEST(OrlanMeshWriter, ReportsAFullDiskAndKeepsTheFormerFile)
     const VolumeFileBuilder file;
     ASSERT_TRUE(file.write(aLattice()).good());
     const QByteArray former = file.bytes();
-    // A limit to the length of files takes the place of the full disk.
-    rlimit limit = {};
-    getrlimit(RLIMIT_FSIZE, &limit);
-    const rlimit small = {8'000, limit.rlim_max};
-    const auto handler = std::signal(SIGXFSZ, SIG_IGN);
-    setrlimit(RLIMIT_FSIZE, &small);
-    const Result result = file.write(aLattice(PrimitiveType::Float64, 3, 20));
-    setrlimit(RLIMIT_FSIZE, &limit);
-    std::signal(SIGXFSZ, handler);
+    Result result;
+    {
+        const FullDisk full(8'000);
+        result = file.write(aLattice(PrimitiveType::Float64, 3, 20));
+    }
     EXPECT_TRUE(result.text().contains(QLatin1String("a.vol"))) << qPrintable(result.text());
     EXPECT_EQ(file.files(), QStringList(QStringLiteral("a.vol")));
     EXPECT_EQ(file.bytes(), former);

@@ -1,7 +1,6 @@
 #include "platform/volumefile/VolumeFileBuilder.h"
 
 #include <QDir>
-#include <QFile>
 
 #include <random>
 #include <stdexcept>
@@ -50,12 +49,6 @@ Result VolumeFileBuilder::write(const Lattice& lattice, const ParamBundle& param
     if (result.good())
         result = writer->writeDataSection("Histogram", {1, 0, ~quint64(0)});
     return result.good() ? writer->finish() : result;
-}
-
-QByteArray VolumeFileBuilder::bytes() const
-{
-    QFile file(QFile::decodeName(path()));
-    return file.open(QIODevice::ReadOnly) ? file.readAll() : QByteArray();
 }
 
 std::unique_ptr<OrlanMesh> VolumeFileBuilder::open() const

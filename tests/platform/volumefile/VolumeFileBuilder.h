@@ -2,9 +2,7 @@
 
 #include "platform/volumefile/OrlanMesh.h"
 #include "platform/volumefile/OrlanMeshWriter.h"
-
-#include <QByteArray>
-#include <QTemporaryDir>
+#include "support/FileContent.h"
 
 namespace Kdd
 {
@@ -25,7 +23,7 @@ public:
     /// All slices, the parameters and a histogram, at `path()`; what the writer answered.
     Result write(const Lattice& lattice, const ParamBundle& parameters = {}) const;
 
-    QByteArray bytes() const;
+    QByteArray bytes() const { return fileContent(QString::fromUtf8(path())); }
 
     /// What was written, from its file or from its bytes; a test that cannot have it fails by an exception.
     std::unique_ptr<OrlanMesh> open() const;

@@ -1,16 +1,14 @@
 #include "kddlib/items/DicomJson.h"
 
-#include "kddlib/items/TextDecoding.h"
-#include "kddlib/tagmodel/TagMap.h"
-#include "kddlib/tagmodel/TagSequence.h"
+#include "kddlib/items/ImageWriter.h"
+#include "kddlib/items/JsonForm.h"
+#include "kddlib/items/NativeModelForm.h"
 
-#include <QString>
+#include <dcmtk/dcmdata/dcdeftag.h>
 
-#include <dcmtk/dcmdata/dcjson.h>
-#include <dcmtk/dcmdata/dctk.h>
-
-#include <memory>
+#include <algorithm>
 #include <ostream>
+#include <utility>
 
 namespace Kdd
 {
@@ -18,143 +16,58 @@ namespace Kdd
 namespace
 {
 
-bool isWritten(const DcmTagKey& key)
+void writeJson(std::ostream& out, const TagMap& map, const std::string& bulkDataRoot,
+               ImageWriter::Entries entries)
 {
-    return key.getGroup() != 0x0006;
+    QByteArray text;
+    ImageWriter(JsonForm::instance(), {}).append(text, map, QByteArray::fromStdString(bulkDataRoot), entries);
+    out.write(text.constData(), text.size());
 }
 
-std::unique_ptr<DcmDataset> rebuilt(const TagMap& map)
+const AttributeForm& formOf(MetadataForm form)
 {
-    auto dataset = std::make_unique<DcmDataset>();
-    map.insertInto(*dataset);
-    return dataset;
+    if (form == MetadataForm::Json)
+        return JsonForm::instance();
+    return NativeModelForm::instance();
 }
 
-/// As a whole where that can be done. Otherwise the first attempt may have converted half of the values, so
-/// a fresh copy is converted value by value.
-std::unique_ptr<DcmDataset> utf8Dataset(const TagMap& map)
+/// Without the UIDs nobody could tell what the other attributes are of.
+QVector<DcmTagKey> withNames(QVector<DcmTagKey> wanted)
 {
-    std::unique_ptr<DcmDataset> dataset = rebuilt(map);
-    const bool isConverted = convertToUtf8(*dataset);
-    if (!isConverted)
-        dataset = rebuilt(map);
-    // What declares itself as UTF-8 was not looked at, and JSON is UTF-8 by definition.
-    const bool hasChanged = convertValuesToUtf8(*dataset);
-    if (!isConverted && !hasChanged)
-        declareUtf8(*dataset);
-    return dataset;
+    if (wanted.isEmpty())
+        return wanted;
+    wanted << DCM_SpecificCharacterSet << DCM_SOPInstanceUID << DCM_StudyInstanceUID << DCM_SeriesInstanceUID;
+    std::sort(wanted.begin(), wanted.end());
+    return wanted;
 }
-
-/// Writes a dataset beside the map it was made from: the dataset has the converted values, the map knows what was
-/// left out.
-class JsonWriter
-{
-public:
-    enum class Entries { Merged, Own };
-
-    JsonWriter(std::ostream& out, Entries entries)
-        : mOut(out)
-        , mEntries(entries)
-        , mFormat(OFFalse)
-    {
-    }
-
-    void object(DcmItem& item, const TagMap& map, const std::string& address)
-    {
-        mOut << '{';
-        bool isFirst = true;
-        // Dataset and map are both in key order. What only the map has was omitted; what only the dataset has
-        // is the character set that the conversion declared.
-        const TagMap::iterator end = map.end();
-        TagMap::iterator source = map.begin();
-        for (DcmObject* next = item.nextInContainer(nullptr); next != nullptr;
-             next = item.nextInContainer(next)) {
-            const DcmTagKey key(next->getGTag(), next->getETag());
-            for (; source != end && source.key() < key; ++source)
-                omitted(map, source, address, isFirst);
-            if (!isWanted(map, key))
-                continue;
-            const bool isFromMap = source != end && source.key() == key;
-            separate(isFirst);
-            if (isFromMap && source.value()->isSequence())
-                sequence(static_cast<DcmSequenceOfItems&>(*next),
-                         static_cast<const TagSequence&>(*source.value()), address + '/' + name(key));
-            else
-                next->writeJson(mOut, mFormat);
-            if (isFromMap)
-                ++source;
-        }
-        for (; source != end; ++source)
-            omitted(map, source, address, isFirst);
-        mOut << '}';
-    }
-
-private:
-    static std::string name(const DcmTagKey& key)
-    {
-        return QString::asprintf("%04X%04X", unsigned(key.getGroup()), unsigned(key.getElement()))
-            .toStdString();
-    }
-
-    bool isWanted(const TagMap& map, const DcmTagKey& key) const
-    {
-        return isWritten(key) && (mEntries == Entries::Merged || map.tagsForLevel().contains(key));
-    }
-
-    void separate(bool& isFirst)
-    {
-        if (!isFirst)
-            mOut << ',';
-        isFirst = false;
-    }
-
-    /// Of what the node holds only the omitted values have a form of their
-    /// own here; all else stands in the dataset.
-    void omitted(const TagMap& map, const TagMap::iterator& source, const std::string& address, bool& isFirst)
-    {
-        if (!source.value()->markedAsOmitted() || !isWanted(map, source.key()))
-            return;
-        separate(isFirst);
-        const std::string key = name(source.key());
-        // The value's own VR went with it.
-        const DcmVR vr(DcmTag(source.key()).getEVR());
-        mOut << '"' << key << "\":{\"vr\":\"" << vr.getValidVRName() << "\",\"BulkDataURI\":";
-        DcmJsonFormat::printString(mOut, address + '/' + key);
-        mOut << '}';
-    }
-
-    void sequence(DcmSequenceOfItems& sequence, const TagSequence& source, const std::string& address)
-    {
-        mOut << '"' << name(sequence.getTag()) << "\":{\"vr\":\"SQ\"";
-        // Rebuilding keeps an item that is not there as an empty one, so
-        // items have the same numbers on both sides.
-        int i = 0;
-        for (DcmObject* item = sequence.nextInContainer(nullptr); item != nullptr;
-             item = sequence.nextInContainer(item), ++i) {
-            mOut << (i == 0 ? ",\"Value\":[" : ",");
-            object(static_cast<DcmItem&>(*item), source.itemToRead(i), address + '/' + std::to_string(i));
-        }
-        // A sequence without items has no member for them.
-        mOut << (i > 0 ? "]}" : "}");
-    }
-
-    std::ostream& mOut;
-    Entries mEntries;
-    DcmJsonFormatCompact mFormat;
-};
 
 }  // namespace
 
 void writeDicomJson(std::ostream& out, const TagMap& map, const std::string& bulkDataRoot)
 {
-    const std::unique_ptr<DcmDataset> dataset = utf8Dataset(map);
-    JsonWriter(out, JsonWriter::Entries::Merged).object(*dataset, map, bulkDataRoot);
+    writeJson(out, map, bulkDataRoot, ImageWriter::Entries::Merged);
 }
 
 void writeOwnDicomJson(std::ostream& out, const TagMap& map, const std::string& bulkDataRoot)
 {
-    const std::unique_ptr<DcmDataset> dataset = utf8Dataset(map);
-    JsonWriter(out, JsonWriter::Entries::Own).object(*dataset, map, bulkDataRoot);
+    writeJson(out, map, bulkDataRoot, ImageWriter::Entries::Own);
+}
+
+struct DicomImageWriter::Private
+{
+    ImageWriter writer;
+};
+
+DicomImageWriter::DicomImageWriter(MetadataForm form, QVector<DcmTagKey> wanted)
+    : d(new Private{ImageWriter(formOf(form), withNames(std::move(wanted)))})
+{
+}
+
+DicomImageWriter::~DicomImageWriter() = default;
+
+void DicomImageWriter::append(QByteArray& out, const TagMap& image, const QByteArray& bulkDataRoot)
+{
+    d->writer.append(out, image, bulkDataRoot, ImageWriter::Entries::Merged);
 }
 
 }  // namespace Kdd

@@ -2,7 +2,15 @@
 
 #include "platform/base/Export.h"
 
+#include <QByteArray>
+#include <QVector>
+
+#include <dcmtk/config/osconfig.h>
+
+#include <dcmtk/dcmdata/dctagkey.h>
+
 #include <iosfwd>
+#include <memory>
 #include <string>
 
 namespace Kdd
@@ -22,5 +30,33 @@ KDD_EXPORT void writeDicomJson(std::ostream& out, const TagMap& map, const std::
 /// have no form in JSON and are left out; texts are decoded by the character set that the node shows, also where it
 /// inherits that.
 KDD_EXPORT void writeOwnDicomJson(std::ostream& out, const TagMap& map, const std::string& bulkDataRoot);
+
+/// In which form images are written.
+enum class MetadataForm {
+    Json,  ///< an object of the DICOM JSON model, as `writeDicomJson` does
+    Xml,   ///< a document of the Native DICOM Model, with its XML declaration
+};
+
+/// Writes image after image of one study. What the images of a series share is written once and then copied, so that an
+/// image costs little more than the values of its own. Series by series is the order that makes the most of it.
+///
+/// The study must outlive the object and not change while it is used. Used by the thread that uses the tree.
+class KDD_EXPORT DicomImageWriter
+{
+public:
+    /// With keys only these attributes of the images, with all that they hold, and always Specific Character Set and
+    /// the UIDs of study, series and image.
+    explicit DicomImageWriter(MetadataForm form, QVector<DcmTagKey> wanted = {});
+    ~DicomImageWriter();
+    DicomImageWriter(const DicomImageWriter&) = delete;
+    DicomImageWriter& operator=(const DicomImageWriter&) = delete;
+
+    /// Appends an image. `bulkDataRoot` is as for `writeDicomJson`.
+    void append(QByteArray& out, const TagMap& image, const QByteArray& bulkDataRoot);
+
+private:
+    struct Private;
+    std::unique_ptr<Private> d;
+};
 
 }  // namespace Kdd

@@ -112,20 +112,6 @@ bool itemsDeclareCharacterSets(DcmItem& item)
     return found;
 }
 
-/// Whether the bytes have changed; binary values and empty ones never do.
-bool convertElement(DcmElement& element, const QByteArray& characterSet)
-{
-    char* text = nullptr;
-    if (!DcmVR(element.getVR()).isaString() || element.getString(text).bad() || text == nullptr)
-        return false;
-    const QByteArray bytes(text);
-    if (isAscii(bytes))
-        return false;
-    const QByteArray converted = decodeText(bytes, characterSet).toUtf8();
-    element.putString(converted.constData());
-    return converted != bytes;
-}
-
 /// Value by value, so that one that does not fit leaves the others right. Whether anything has changed.
 bool convertItem(DcmItem& item, const OFString& inherited)
 {
@@ -137,8 +123,8 @@ bool convertItem(DcmItem& item, const OFString& inherited)
     for (DcmObject* object = item.nextInContainer(nullptr); object != nullptr;
          object = item.nextInContainer(object)) {
         if (object->ident() != EVR_SQ)
-            hasChanged |=
-                convertElement(static_cast<DcmElement&>(*object), QByteArray::fromStdString(characterSet));
+            hasChanged |= convertValueToUtf8(static_cast<DcmElement&>(*object),
+                                             QByteArray::fromStdString(characterSet));
     }
     forItems(item, [&](DcmItem& below) { hasChanged |= convertItem(below, characterSet); });
     return hasChanged;
@@ -188,6 +174,20 @@ bool convertValuesToUtf8(DcmItem& dataset)
     dataset.putAndInsertString(DCM_SpecificCharacterSet, kUtf8CharacterSet);
     declareUtf8InItems(dataset);
     return true;
+}
+
+/// Binary values and empty ones never change.
+bool convertValueToUtf8(DcmElement& element, const QByteArray& characterSet)
+{
+    char* text = nullptr;
+    if (!DcmVR(element.getVR()).isaString() || element.getString(text).bad() || text == nullptr)
+        return false;
+    const QByteArray bytes(text);
+    if (isAscii(bytes))
+        return false;
+    const QByteArray converted = decodeText(bytes, characterSet).toUtf8();
+    element.putString(converted.constData());
+    return converted != bytes;
 }
 
 void declareUtf8(DcmItem& dataset)

@@ -5,6 +5,7 @@
 #include <QByteArray>
 #include <QString>
 
+class DcmElement;
 class DcmItem;
 
 namespace Kdd
@@ -23,6 +24,9 @@ KDD_EXPORT bool convertToUtf8(DcmItem& dataset);
 /// already stay as they are; where nothing changes the declared character sets stay as well. Whether
 /// anything has changed.
 KDD_EXPORT bool convertValuesToUtf8(DcmItem& dataset);
+
+/// The same for one value by the character set of its item; the one declared stays. Whether it has changed.
+bool convertValueToUtf8(DcmElement& element, const QByteArray& characterSet);
 
 /// Declares UTF-8 throughout a dataset of nothing but ASCII, unless it declares what no one knows.
 KDD_EXPORT void declareUtf8(DcmItem& dataset);

@@ -10,18 +10,6 @@ namespace
 
 const QVector<Http::MediaType> kOffers = {{"application/dicom+json", ""}, {"application/json", ""}};
 
-/// The address of the service: what stands before the resource in the path, behind the server's own.
-QByteArray rootOf(const Http::Request& request, const ResourcePath& path)
-{
-    int own = path.rest.size() + (path.resource.isEmpty() ? 0 : 1);
-    for (const QByteArray* uid : {&path.study, &path.series, &path.instance})
-        own += uid->isEmpty() ? 0 : 2;
-    QByteArray root = request.base;
-    for (int i = 0; i < request.path.size() - own; ++i)
-        root += '/' + request.path.at(i).toPercentEncoding();
-    return root;
-}
-
 void addWarnings(const SearchRequest& request, const SearchRun& run, const QByteArray& root, Http::Response& response)
 {
     const QByteArray begin = "299 " + root + ": ";
@@ -55,7 +43,7 @@ Http::Response SearchResource::answer(const Http::Request& request, const Resour
     if (!SearchRequest::parse(request.query, search, reason) || !SearchPlan::make(search, plan, reason))
         return Http::failure(400, reason);
 
-    const QByteArray root = rootOf(request, path);
+    const QByteArray root = request.base;
     Http::Response response;
     const Result result = mDatabase.ask([&](Kxg::StudySearch& database) {
         FoundAnswers answers(search, root);

@@ -83,17 +83,14 @@ const Damage kDamages[] = {
      "(7fe0,0010)", true, true, false},
 };
 
-class DamagedFile : public testing::Test
+class DamagedFile : public FileTest
 {
 protected:
     QByteArray put(const QByteArray& content) const
     {
-        const QString path = mFolder.filePath(QStringLiteral("file"));
-        putFile(path, content);
-        return path.toLocal8Bit();
+        putFile(path(), content);
+        return path().toLocal8Bit();
     }
-
-    QTemporaryDir mFolder;
 };
 
 TEST_F(DamagedFile, GivesWhatIsSoundAndTellsTheRest)

@@ -1,0 +1,80 @@
+// What clients send: their requests, and the addresses in them.
+
+#include "fuzz/Property.h"
+#include "server/http/RequestReader.h"
+#include "server/http/RequestTarget.h"
+
+#include <algorithm>
+
+using namespace Kdd;
+
+namespace
+{
+
+constexpr Http::RequestReader::Limits kLimits = {4096, 1024};
+
+QByteArray escaped(const QByteArray& text)
+{
+    return text.toPercentEncoding();
+}
+
+/// The parts written anew give the same parts.
+void checkTarget(const QByteArray& target)
+{
+    Http::RequestTarget parsed;
+    if (!Http::RequestTarget::parse(target, parsed)) {
+        require(parsed.path.isEmpty() && parsed.query.isEmpty(), "nothing is left of what is refused");
+        return;
+    }
+    QByteArray own = "/";
+    for (const QByteArray& segment : parsed.path) {
+        require(!segment.isEmpty() && segment != "." && segment != ".." && !segment.contains('/') &&
+                    !segment.contains('\0'),
+                "a segment leads one folder down");
+        own += escaped(segment) + '/';
+    }
+    char separator = '?';
+    for (const Http::Field& field : parsed.query) {
+        own += separator + escaped(field.name) + '=' + escaped(field.value);
+        separator = '&';
+    }
+    Http::RequestTarget again;
+    require(Http::RequestTarget::parse(own, again), "its own text is accepted");
+    require(again.path == parsed.path && again.query.size() == parsed.query.size() &&
+                std::equal(parsed.query.begin(), parsed.query.end(), again.query.begin(),
+                           [](const Http::Field& one, const Http::Field& other) {
+                               return one.name == other.name && one.value == other.value;
+                           }),
+            "and gives the same parts");
+}
+
+/// What is made of the bytes when they come in pieces of a size.
+QByteArray requestsIn(const QByteArray& bytes, int piece)
+{
+    Http::RequestReader reader(kLimits);
+    QByteArray text;
+    auto state = Http::RequestReader::State::Between;
+    for (int at = 0; at < bytes.size() && state != Http::RequestReader::State::Refused; at += piece) {
+        reader.add(bytes.constData() + at, std::min(piece, bytes.size() - at));
+        while ((state = reader.advance()) == Http::RequestReader::State::Whole) {
+            const Http::Request request = reader.take();
+            text += request.target + ' ' + reader.host() + '\n';
+            for (const Http::Field& field : request.headers)
+                text += field.name + '=' + field.value + '\n';
+        }
+    }
+    return text + QByteArray::number(reader.refusal());
+}
+
+}  // namespace
+
+extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size)
+{
+    const QByteArray bytes(reinterpret_cast<const char*>(data),
+                           static_cast<int>(std::min<size_t>(size, 20000)));
+    checkTarget(bytes.left(bytes.indexOf('\n')));
+    const QByteArray whole = requestsIn(bytes, bytes.size() + 1);
+    if (bytes.size() < 2000)
+        require(requestsIn(bytes, 7) == whole, "it does not matter in which pieces a request comes");
+    return 0;
+}

@@ -1,0 +1,443 @@
+#include "kddlib/archive/CorrectedDataset.h"
+
+#include "kddlib/Limits.h"
+#include "kddlib/net/dicom/DicomFileReader.h"
+#include "kddlib/tagfile/qa/ImageIdentity.h"
+#include "kddlib/tagfile/qa/QAEditor.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
+#include "kddlib/tagmodel/TagMap.h"
+#include "kddlib/tagmodel/TagSequence.h"
+#include "platform/volume/FragmentReader.h"
+#include "platform/volume/KxCompressedDataMedia.h"
+#include "platform/volume/StoredFrame.h"
+
+#include <QtEndian>
+
+#include <dcmtk/dcmdata/dcostrmb.h>
+#include <dcmtk/dcmdata/dctk.h>
+#include <dcmtk/dcmdata/dcwcache.h>
+
+#include <memory>
+#include <vector>
+
+namespace Kdd
+{
+
+namespace
+{
+
+constexpr Uint16 kOwnGroup = 0x0006;
+
+/// Of what is not pixels, which has to be in memory to be changed [bytes].
+constexpr qint64 kMaxHeader = qint64(512) * 1024 * 1024;
+
+Result readInto(MediaSource& file, qint64 offset, qint64 end, QByteArray& bytes)
+{
+    const int start = bytes.size();
+    bytes.resize(start + static_cast<int>(end - offset));
+    for (qint64 done = start; done < bytes.size();) {
+        const qint64 got = file.read(offset + done - start, bytes.data() + done, bytes.size() - done);
+        if (got <= 0)
+            return Result::failure(QStringLiteral("The file ends early or cannot be read"));
+        done += got;
+    }
+    return {};
+}
+
+Result readWithoutPixels(MediaSource& file, const FileStretch& pixels, DcmFileFormat& dicom)
+{
+    if (file.size() - pixels.length > kMaxHeader)
+        return Result::failure(QStringLiteral("The file has more attributes than can be held"));
+    QByteArray bytes;
+    Result result = readInto(file, 0, pixels.offset, bytes);
+    if (result.good())
+        result = readInto(file, pixels.end(), file.size(), bytes);
+    if (result.bad())
+        return result;
+    const OFCondition condition = readDicomBuffer(bytes, dicom);
+    return condition.good() ? Result()
+                            : Result::failure(QStringLiteral("The DICOM file cannot be read: ") +
+                                              QString::fromLatin1(condition.text()));
+}
+
+bool isPixels(const DcmTagKey& key)
+{
+    return key == DCM_PixelData || key == DCM_FloatPixelData || key == DCM_DoubleFloatPixelData;
+}
+
+bool isPassedOver(const DcmTagKey& key)
+{
+    return key.getGroup() == kOwnGroup || isPixels(key);
+}
+
+bool holdsOmitted(const TagMap& map)
+{
+    const TagMap::iterator end = map.end();
+    for (TagMap::iterator it = map.begin(); it != end; ++it) {
+        if (it.value()->markedAsOmitted())
+            return true;
+        const auto* items = it.value()->isSequence() ? static_cast<const TagSequence*>(it.value()) : nullptr;
+        for (int i = 0; items != nullptr && i < items->numItems(); ++i) {
+            if (holdsOmitted(items->itemToRead(i)))
+                return true;
+        }
+    }
+    return false;
+}
+
+/// Makes a dataset show what a tag file shows, in place; what is equal stays as it is, byte by byte.
+class Correction
+{
+public:
+    bool hasChanged() const { return mHasChanged; }
+
+    Result apply(DcmItem& item, const TagMap& file, const TagMap& shown)
+    {
+        const TagMap::iterator fileEnd = file.end();
+        const TagMap::iterator shownEnd = shown.end();
+        TagMap::iterator held = file.begin();
+        Result result;
+        for (TagMap::iterator it = shown.begin(); it != shownEnd && result.good(); ++it) {
+            for (; held != fileEnd && held.key() < it.key(); ++held)
+                remove(item, held.key());
+            const bool isInFile = held != fileEnd && held.key() == it.key();
+            if (!isPassedOver(it.key()))
+                result = show(item, it.key(), isInFile ? held.value() : nullptr, *it.value());
+            if (isInFile)
+                ++held;
+        }
+        for (; held != fileEnd && result.good(); ++held)
+            remove(item, held.key());
+        return result;
+    }
+
+private:
+    void remove(DcmItem& item, const DcmTagKey& key)
+    {
+        if (isPassedOver(key))
+            return;
+        item.findAndDeleteElement(key);
+        mHasChanged = true;
+    }
+
+    Result show(DcmItem& item, const DcmTagKey& key, const TagElement* held, const TagElement& shown)
+    {
+        if (shown.markedAsOmitted())
+            return held != nullptr ? Result() : missing(key);
+        if (held != nullptr && held->compare(shown, true, nullptr))
+            return {};
+        mHasChanged = true;
+        if (shown.isSequence())
+            return showItems(item, key, held, static_cast<const TagSequence&>(shown));
+        return replace(item, key, shown);
+    }
+
+    static Result missing(const DcmTagKey& key)
+    {
+        return Result::failure(
+            QStringLiteral("The file does not have the value of %1, so it is not the one the "
+                           "tag file was made from")
+                .arg(keyName(key)));
+    }
+
+    static Result replace(DcmItem& item, const DcmTagKey& key, const TagElement& shown)
+    {
+        std::unique_ptr<DcmElement> element(shown.createDcmElement(key));
+        if (element == nullptr || item.insert(element.get(), OFTrue).bad())
+            return Result::failure(QStringLiteral("The value of %1 cannot be written").arg(keyName(key)));
+        static_cast<void>(element.release());
+        return {};
+    }
+
+    Result showItems(DcmItem& item, const DcmTagKey& key, const TagElement* held, const TagSequence& shown)
+    {
+        DcmSequenceOfItems* items = nullptr;
+        const auto* own =
+            held != nullptr && held->isSequence() ? static_cast<const TagSequence*>(held) : nullptr;
+        const bool isSame = own != nullptr && own->numItems() == shown.numItems() &&
+                            item.findAndGetSequence(key, items).good() &&
+                            items->card() == static_cast<unsigned long>(own->numItems());
+        if (!isSame) {
+            for (int i = 0; i < shown.numItems(); ++i) {
+                if (holdsOmitted(shown.itemToRead(i)))
+                    return missing(key);
+            }
+            return replace(item, key, shown);
+        }
+        Result result;
+        int i = 0;
+        for (DcmObject* next = items->nextInContainer(nullptr); next != nullptr && result.good();
+             next = items->nextInContainer(next), ++i)
+            result = apply(static_cast<DcmItem&>(*next), own->itemToRead(i), shown.itemToRead(i));
+        return result;
+    }
+
+    bool mHasChanged = false;
+};
+
+/// What decoding makes of the attributes that tell how pixels are stored.
+void describeDecoded(DcmDataset& dataset, const FrameIndex& index)
+{
+    for (const DcmTagKey& key :
+         {DcmTagKey(0x7fe0, 0x0001), DcmTagKey(0x7fe0, 0x0002), DcmTagKey(0x7fe0, 0x0003)})
+        dataset.findAndDeleteElement(key);
+    const QByteArray photometric = index.decodedPhotometric();
+    if (!photometric.isEmpty())
+        dataset.putAndInsertString(DCM_PhotometricInterpretation, photometric.constData());
+    if (dataset.tagExists(DCM_PlanarConfiguration))
+        dataset.putAndInsertUint16(DCM_PlanarConfiguration, 0);
+}
+
+/// Icons are compressed as the image is, and are decoded with it.
+Result decodeIcon(DcmItem& item)
+{
+    DcmElement* element = nullptr;
+    E_TransferSyntax xfer = EXS_Unknown;
+    StoredFrame icon;
+    if (item.findAndGetElement(DCM_PixelData, element).bad() || findFragments(*element, xfer) == nullptr)
+        return {};
+    Result result = readStoredFrame(item, 0, 0, icon);
+    const bool isWide = sizeOf(icon.pixels.type) > 1;
+    QByteArray pixels = icon.pixels.pixels;
+    pixels.append(pixels.size() % 2, '\0');
+    auto native = std::make_unique<DcmPixelData>(DcmTag(DCM_PixelData, isWide ? EVR_OW : EVR_OB));
+    native->putUint8Array(reinterpret_cast<const Uint8*>(pixels.constData()),
+                          static_cast<Uint32>(pixels.size()));
+    if (result.good() && icon.pixels.components == 3) {
+        const bool isRgb = icon.colour == StoredFrame::Colour::Rgb;
+        item.putAndInsertString(DCM_PhotometricInterpretation, isRgb ? "RGB" : "YBR_FULL");
+        item.putAndInsertUint16(DCM_PlanarConfiguration, 0);
+    }
+    if (result.good() && item.insert(native.get(), OFTrue).good())
+        static_cast<void>(native.release());
+    return result.within(QStringLiteral("The icon"));
+}
+
+/// Those in sequences; the image's own pixels are not in the dataset.
+Result decodeIcons(DcmItem& item, int depth)
+{
+    Result result;
+    for (DcmObject* object = item.nextInContainer(nullptr); object != nullptr && result.good();
+         object = item.nextInContainer(object)) {
+        if (object->ident() != EVR_SQ || depth >= kMaxItemDepth)
+            continue;
+        auto& items = static_cast<DcmSequenceOfItems&>(*object);
+        for (DcmObject* next = items.nextInContainer(nullptr); next != nullptr && result.good();
+             next = items.nextInContainer(next)) {
+            result = decodeIcon(static_cast<DcmItem&>(*next));
+            if (result.good())
+                result = decodeIcons(static_cast<DcmItem&>(*next), depth + 1);
+        }
+    }
+    return result;
+}
+
+QByteArray decodedVr(DcmDataset& dataset)
+{
+    Uint16 bits = 0;
+    dataset.findAndGetUint16(DCM_BitsAllocated, bits);
+    return bits > 8 ? "OW" : "OB";
+}
+
+template <typename Object, typename... Arguments>
+Result written(Object& object, QByteArray& bytes, E_TransferSyntax syntax, Arguments... arguments)
+{
+    constexpr int kBlock = 64 * 1024;
+    std::vector<char> block(kBlock);
+    DcmOutputBufferStream out(block.data(), kBlock);
+    DcmWriteCache cache;
+    OFCondition condition;
+    object.transferInit();
+    do {
+        condition = object.write(out, syntax, EET_UndefinedLength, &cache, arguments...);
+        void* from = nullptr;
+        offile_off_t length = 0;
+        out.flushBuffer(from, length);
+        bytes.append(static_cast<const char*>(from), static_cast<int>(length));
+    } while (condition == EC_StreamNotifyClient && bytes.size() <= kMaxHeader);
+    object.transferEnd();
+    return condition.good() ? Result()
+                            : Result::failure(QStringLiteral("The dataset cannot be written: ") +
+                                              QString::fromLatin1(condition.text()));
+}
+
+/// The elements behind the pixels, taken out of the dataset.
+std::unique_ptr<DcmDataset> takeTail(DcmDataset& dataset)
+{
+    auto tail = std::make_unique<DcmDataset>();
+    std::vector<DcmElement*> behind;
+    for (unsigned long i = dataset.card(); i > 0 && DCM_PixelData < dataset.getElement(i - 1)->getTag(); --i)
+        behind.push_back(dataset.getElement(i - 1));
+    for (DcmElement* element : behind) {
+        dataset.remove(element);
+        tail->insert(element);
+    }
+    return tail;
+}
+
+OFCondition putUid(DcmMetaInfo& meta, const DcmTagKey& key, const QByteArray& uid)
+{
+    return uid.isEmpty() ? EC_Normal : meta.putAndInsertString(key, uid.constData());
+}
+
+Result writeMeta(DcmFileFormat& dicom, const TagMap& image, const QByteArray& syntaxUID, QByteArray& bytes)
+{
+    DcmMetaInfo& meta = *dicom.getMetaInfo();
+    QByteArray sopClass;
+    image.findAndGetString(DCM_SOPClassUID, sopClass);
+    // What is missing in it comes first. DCMTK does not follow the dataset's UIDs in every file, and the syntax may be
+    // one that it has no name for.
+    OFCondition condition = dicom.validateMetaInfo(EXS_LittleEndianExplicit, EWM_updateMeta);
+    if (condition.good())
+        condition = putUid(meta, DCM_MediaStorageSOPClassUID, sopClass);
+    if (condition.good())
+        condition = putUid(meta, DCM_MediaStorageSOPInstanceUID, image.uid(TagMap::ImageLevel));
+    if (condition.good())
+        condition = putUid(meta, DCM_TransferSyntaxUID, syntaxUID);
+    if (condition.good())
+        condition = meta.computeGroupLengthAndPadding(EGL_recalcGL, EPD_noChange, EXS_LittleEndianExplicit,
+                                                      EET_UndefinedLength);
+    return condition.good() ? written(meta, bytes, EXS_LittleEndianExplicit)
+                            : Result::failure(QStringLiteral("The meta header cannot be written: ") +
+                                              QString::fromLatin1(condition.text()));
+}
+
+/// The tag, VR and length of the element with the pixels; of encapsulated ones the length is undefined.
+QByteArray pixelHead(const FrameIndex& index, bool isExplicit, bool isEncapsulated, const QByteArray& vr,
+                     qint64 length)
+{
+    QByteArray head(isExplicit ? 12 : 8, 0);
+    qToLittleEndian<quint16>(index.pixelKey().getGroup(), head.data());
+    qToLittleEndian<quint16>(index.pixelKey().getElement(), head.data() + 2);
+    if (isExplicit)
+        head.replace(4, 2, vr);
+    qToLittleEndian<quint32>(isEncapsulated ? 0xffffffff : static_cast<quint32>(length),
+                             head.data() + head.size() - 4);
+    return head;
+}
+
+}  // namespace
+
+Result ImageOrigin::of(const TagMap& image, ImageOrigin& origin)
+{
+    AuditLog log;
+    QVector<AuditEntry> entries;
+    const QByteArray path = filePathOf(image);
+    if (path.isEmpty())
+        return Result::failure(QStringLiteral("The image has no file"));
+    if (!log.read(image) || !log.decode(entries))
+        return Result::failure(QStringLiteral("The image's audit log is damaged"));
+    const ImageIdentity before = identityBefore(log, identityOf(image, path), path);
+    origin = {path, before.studyUID, before.image == path ? QByteArray() : before.image};
+    return {};
+}
+
+Result CorrectedDataset::make(MediaSource& file, const FrameIndex& index, const TagMap& image,
+                              const QByteArray& syntaxUID)
+{
+    const bool isStored = syntaxUID == index.transferSyntaxUID();
+    const bool isExplicit = syntaxUID != "1.2.840.10008.1.2";
+    DcmFileFormat dicom;
+    Result result = readWithoutPixels(file, index.pixelElement(), dicom);
+    if (result.bad())
+        return result;
+    DcmDataset& dataset = *dicom.getDataset();
+    const std::unique_ptr<TagMap> held(TagMap::createTagMap(&dataset, kDefaultValueBound));
+    Correction correction;
+    result = correction.apply(dataset, *held, image);
+    if (result.bad())
+        return result;
+
+    CorrectedDataset made;
+    made.mIsAsInFile = isStored && !correction.hasChanged();
+    const bool isDecoded = index.isEncapsulated() && !isStored;
+    if (index.hasPixels()) {
+        made.mPixels = isDecoded ? Pixels::Decoded : Pixels::Stored;
+        made.mPixelLength = isDecoded ? DecodedPixels::lengthOf(index) : index.pixelValue().length;
+        if (made.mPixelLength >= 0xffffffff && !index.isEncapsulated())
+            return Result::failure(QStringLiteral("The pixels are too long for one attribute"));
+    }
+    if (isDecoded && (made.mPixelLength <= 0 || made.mPixelLength >= 0xffffffff))
+        return Result::failure(QStringLiteral("The decoded pixels are too long for one attribute"));
+    if (isDecoded) {
+        describeDecoded(dataset, index);
+        result = decodeIcons(dataset, 0);
+        if (result.bad())
+            return result;
+    }
+    const std::unique_ptr<DcmDataset> tail = takeTail(dataset);
+    E_TransferSyntax xfer = isExplicit ? EXS_LittleEndianExplicit : EXS_LittleEndianImplicit;
+    // Icons may be compressed as well.
+    if (index.isEncapsulated() && !isDecoded && dataset.getOriginalXfer() != EXS_Unknown)
+        xfer = dataset.getOriginalXfer();
+    result = writeMeta(dicom, image, syntaxUID, made.mHead);
+    if (result.good())
+        result = written(dataset, made.mHead, xfer, EGL_withoutGL);
+    if (result.good() && tail->card() > 0)
+        result = written(*tail, made.mTail, xfer, EGL_withoutGL);
+    if (result.bad())
+        return result;
+    if (index.hasPixels()) {
+        const QByteArray vr = isDecoded ? decodedVr(dataset) : index.pixelVr();
+        made.mHead +=
+            pixelHead(index, isExplicit, index.isEncapsulated() && !isDecoded, vr, made.mPixelLength);
+    }
+    *this = made;
+    return {};
+}
+
+qint64 DecodedPixels::lengthOf(const FrameIndex& index)
+{
+    // Divided, not multiplied: a number of frames is a claim and the product may wrap.
+    constexpr qint64 kMostBits = 8 * qint64(0xffffffff);
+    const qint64 bits = index.decodedBits();
+    if (bits > 0 && index.frames() > kMostBits / bits)
+        return kMostBits / 8;
+    const qint64 bytes = (bits * index.frames() + 7) / 8;
+    return bytes + bytes % 2;
+}
+
+Result DecodedPixels::next(QByteArray& block)
+{
+    block.clear();
+    if (mFrame < mIndex.frames()) {
+        QByteArray frame;
+        Result result = mIndex.readDecoded(mFile, mFrame, frame);
+        if (result.bad())
+            return result.within(QStringLiteral("Frame %1").arg(mFrame + 1));
+        ++mFrame;
+        append(frame, block);
+    }
+    // The last bits, and what makes the length even.
+    if (mFrame == mIndex.frames() && mBits > 0) {
+        block.append(static_cast<char>(mPending));
+        mBits = 0;
+    }
+    mGiven += block.size();
+    if (mFrame == mIndex.frames() && mGiven % 2 != 0) {
+        block.append('\0');
+        ++mGiven;
+    }
+    return {};
+}
+
+void DecodedPixels::append(const QByteArray& frame, QByteArray& block)
+{
+    const auto rest = static_cast<int>(mIndex.decodedBits() % 8);
+    if (rest == 0) {
+        block = frame;
+        return;
+    }
+    for (int i = 0; i < frame.size(); ++i) {
+        const int bits = i + 1 < frame.size() ? 8 : rest;
+        mPending |= unsigned(quint8(frame.at(i))) << unsigned(mBits);
+        mBits += bits;
+        if (mBits >= 8) {
+            block.append(static_cast<char>(mPending & 0xffU));
+            mPending >>= 8U;
+            mBits -= 8;
+        }
+    }
+}
+
+}  // namespace Kdd

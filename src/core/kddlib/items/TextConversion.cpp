@@ -1,0 +1,100 @@
+#include "kddlib/items/TextConversion.h"
+
+#include "kddlib/items/TextDecoding.h"
+#include "kddlib/tagmodel/TagElement.h"
+#include "kddlib/tagmodel/TagMap.h"
+
+#include <dcmtk/dcmdata/dcdeftag.h>
+#include <dcmtk/dcmdata/dcelem.h>
+
+#include <memory>
+
+namespace Kdd
+{
+
+namespace
+{
+
+const char* const kUtf8 = "ISO_IR 192";
+
+QByteArray declaredBy(const TagElement* element)
+{
+    if (element == nullptr || element->isSequence())
+        return {};
+    const std::unique_ptr<DcmElement> rebuilt(element->createDcmElement(DCM_SpecificCharacterSet));
+    OFString text;
+    if (rebuilt == nullptr || rebuilt->getOFStringArray(text).bad())
+        return {};
+    return {text.c_str(), static_cast<int>(text.size())};
+}
+
+QByteArray storedIn(const TagMap& node)
+{
+    const TagElement* element = node.findElement(DCM_SpecificCharacterSet);
+    return element != nullptr ? element->value() : QByteArray();
+}
+
+}  // namespace
+
+TextConversion::TextConversion(const TagMap& image)
+    : mStored(storedIn(image))
+    , mCharacterSet(declaredBy(image.findElement(DCM_SpecificCharacterSet)))
+{
+    mIsUtf8 = mCharacterSet == kUtf8;
+    mIsSelected = mIsUtf8 || mConverter.selectCharacterSet(mCharacterSet.constData()).good();
+    // The one set of DICOM whose lower half is not ASCII throughout.
+    mReplacesAscii = mCharacterSet.contains("IR 13");
+}
+
+bool TextConversion::isFor(const TagMap& image) const
+{
+    return storedIn(image) == mStored;
+}
+
+bool TextConversion::nextWay(unsigned int findings)
+{
+    switch (mWay) {
+    case Way::Together:
+        if (mHasTriedTogether || (findings & (kUnexplained | kItemDeclares)) == 0)
+            return false;
+        mHasTriedTogether = true;
+        mTogether = findings;
+        mWay = Way::Each;
+        return true;
+    case Way::Each:
+        if ((findings & kChanged) != 0)
+            return false;
+        mWay = (mTogether & kUnexplained) != 0 ? Way::AsStored : Way::Together;
+        return true;
+    case Way::AsStored:
+        return false;
+    }
+    return false;
+}
+
+QByteArray TextConversion::characterSetOf(const TagMap& item, const QByteArray& above) const
+{
+    if (mWay != Way::Each)
+        return above;
+    const QByteArray own = declaredBy(item.findElement(DCM_SpecificCharacterSet));
+    return own.isEmpty() ? above : own;
+}
+
+unsigned int TextConversion::convert(DcmElement& element, const QByteArray& characterSet)
+{
+    switch (mWay) {
+    case Way::Together:
+        if (!mIsUtf8 && (!mIsSelected || element.convertCharacterSet(mConverter).bad()))
+            return kUnexplained;
+        // What is not subject to the declared set, or declares itself as UTF-8, was not looked at.
+        convertValueToUtf8(element, kUtf8);
+        return 0;
+    case Way::Each:
+        return convertValueToUtf8(element, characterSet) ? kChanged : 0;
+    case Way::AsStored:
+        return 0;
+    }
+    return 0;
+}
+
+}  // namespace Kdd

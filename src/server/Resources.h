@@ -1,0 +1,29 @@
+#pragma once
+
+#include "server/dicomweb/Resource.h"
+#include "server/dicomweb/StudyShelf.h"
+#include "server/dicomweb/retrieve/ObjectShelf.h"
+#include "server/dicomweb/search/ThreadSearch.h"
+
+#include <kddlib/Kxg.h>
+
+#include <memory>
+#include <vector>
+
+namespace Kdd
+{
+
+/// What the server keeps of the archive between requests.
+struct ServedArchive
+{
+    // A study of 1,000 images takes about 4 MiB, where the frames of an image lie about 300 bytes.
+    std::shared_ptr<DicomWeb::StudyShelf> studies = std::make_shared<DicomWeb::StudyShelf>(qint64(64) << 20);
+    std::shared_ptr<DicomWeb::ObjectShelf> objects = std::make_shared<DicomWeb::ObjectShelf>(32 << 20);
+    DicomWeb::ThreadSearch database{Kxg::DatabaseServer()};
+};
+
+/// All that answers below the prefix of DICOMweb, in the order in which they are asked whether a path is theirs. The
+/// archive outlives them.
+std::vector<std::unique_ptr<DicomWeb::Resource>> makeResources(ServedArchive& archive);
+
+}  // namespace Kdd

@@ -1,0 +1,169 @@
+#include "server/Server.h"
+
+#include "server/RequestLog.h"
+#include "server/Resources.h"
+#include "server/Router.h"
+#include "server/StatusPages.h"
+#include "server/ViewerFiles.h"
+#include "server/browser/BrowserService.h"
+#include "server/dicomweb/DicomWebService.h"
+#include "server/http/HttpServer.h"
+
+#include <kddlib/LogFile.h>
+#include <sys/resource.h>
+
+#include <algorithm>
+
+namespace Kdd
+{
+namespace
+{
+
+const QByteArray kViewerPath = "/viewer";
+
+/// Watching takes little; its own threads answer when those of the others are all busy.
+Http::HttpSettings statusSettings(const ServerSettings& settings)
+{
+    Http::HttpSettings made = settings.http;
+    made.address = settings.status.value_or(Http::ListenAddress());
+    made.certificateFile.clear();
+    made.keyFile.clear();
+    made.workers = 2;
+    made.ioThreads = 1;
+    made.connections = 100;
+    return made;
+}
+
+Result checkReach(const Http::ListenAddress& address)
+{
+    if (address.isLoopback())
+        return {};
+    return Result::failure(
+        QStringLiteral("%1 can be reached by other machines, and nobody is asked here who he is: "
+                       "listen at 127.0.0.1 or [::1], behind a server that does ask")
+            .arg(QString::fromUtf8(address.text())));
+}
+
+/// Descriptors for files, the database and whatever else is open beside connections.
+constexpr int kOtherDescriptors = 200;
+
+/// So many connections as the system has descriptors for: each may send a file.
+int affordableConnections(int wanted)
+{
+    rlimit limit = {};
+    if (::getrlimit(RLIMIT_NOFILE, &limit) != 0)
+        return wanted;
+    // What a process begins with is meant for programs that wait for all their descriptors at once.
+    limit.rlim_cur = limit.rlim_max;
+    ::setrlimit(RLIMIT_NOFILE, &limit);
+    const auto descriptors = static_cast<qint64>(std::min<rlim_t>(limit.rlim_cur, 10'000'000));
+    const auto most = static_cast<int>(std::max<qint64>(1, (descriptors - kOtherDescriptors) / 2));
+    if (wanted > most)
+        LogFile::printf("The system allows %d connections, not %d: it gives this process %lld descriptors",
+                        most, wanted, static_cast<long long>(descriptors));
+    return std::min(wanted, most);
+}
+
+/// Those who watch are none of whom is watched.
+class Unobserved : public Http::ExchangeObserver
+{
+public:
+    void ended(const Http::Exchange& /*exchange*/) override {}
+};
+
+}  // namespace
+
+struct Server::Private
+{
+    explicit Private(const ServerSettings& settings)
+        : prefix(Router::segmentsOf(settings.prefix))
+        , log(metrics, prefix, settings.slow)
+        , statusPages(metrics)
+        , guard(settings.addresses, router)
+        , statusGuard(settings.addresses, statusPages)
+        , http(settings.http, guard, log)
+    {
+        router.add(prefix,
+                   std::make_unique<DicomWeb::DicomWebService>(prefix.size(), makeResources(archive)));
+        Browser::BrowserSettings browser;
+        browser.dicomWeb = prefix.toList().join('/');
+        browser.hasViewer = !settings.viewer.isEmpty();
+        browser.hasThumbnails = true;
+        router.add({}, std::make_unique<Browser::BrowserService>(*archive.studies, browser));
+        if (settings.status)
+            status = std::make_unique<Http::HttpServer>(statusSettings(settings), statusGuard, unobserved);
+        metrics.addGauge("kdd_http_connections", "Connections that are open.",
+                         [this] { return http.connections(); });
+        metrics.addGauge("kdd_http_requests_in_flight", "Requests whose answers are not sent whole.",
+                         [this] { return http.requestsInFlight(); });
+    }
+
+    QVector<QByteArray> prefix;
+    ServedArchive archive;
+    Http::Metrics metrics;
+    RequestLog log;
+    Unobserved unobserved;
+    Router router;
+    StatusPages statusPages;
+    Access::AddressGuard guard;
+    Access::AddressGuard statusGuard;
+    Http::HttpServer http;
+    std::unique_ptr<Http::HttpServer> status;  // the first to go: it asks all the others
+};
+
+std::unique_ptr<Server> Server::make(ServerSettings settings, Result& result)
+{
+    result = settings.addresses.normalise();
+    if (result.good())
+        result = checkReach(settings.http.address);
+    if (result.good() && settings.status)
+        result = checkReach(*settings.status);
+    std::unique_ptr<ViewerFiles> viewer;
+    const QVector<QByteArray> viewerPath = Router::segmentsOf(kViewerPath);
+    if (result.good() && !settings.viewer.isEmpty())
+        viewer = ViewerFiles::open(settings.viewer, viewerPath.size(), result);
+    if (result.bad())
+        return nullptr;
+    settings.http.connections = affordableConnections(settings.http.connections);
+    auto made = std::make_unique<Private>(settings);
+    if (viewer != nullptr)
+        made->router.add(viewerPath, std::move(viewer));
+    return std::unique_ptr<Server>(new Server(std::move(made)));
+}
+
+Server::Server(std::unique_ptr<Private> made)
+    : d(std::move(made))
+{
+}
+
+Server::~Server() = default;
+
+Result Server::start()
+{
+    Result result = d->http.start();
+    if (result.good() && d->status != nullptr)
+        result = d->status->start();
+    if (result.bad())
+        stop();
+    return result;
+}
+
+/// The watchers see it to its end.
+void Server::stop()
+{
+    d->http.stop();
+    if (d->status != nullptr)
+        d->status->stop();
+}
+
+QByteArray Server::address() const
+{
+    return d->http.address();
+}
+
+QByteArray Server::statusAddress() const
+{
+    return d->status != nullptr ? d->status->address() : QByteArray();
+}
+
+}  // namespace Kdd

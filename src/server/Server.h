@@ -1,0 +1,57 @@
+#pragma once
+
+#include "server/access/AddressGuard.h"
+#include "server/http/HttpSettings.h"
+
+#include <QString>
+
+#include <kddlib/Result.h>
+
+#include <memory>
+#include <optional>
+
+namespace Kdd
+{
+
+struct ServerSettings
+{
+    Http::HttpSettings http;
+    std::optional<Http::ListenAddress> status;  ///< of a listener for those who watch the server
+    Access::AddressRules addresses;
+    QByteArray prefix = "/dicom-web";      ///< of the paths of DICOMweb
+    QString viewer;                        ///< folder of a viewer's files, served under /viewer; empty: none
+    std::chrono::milliseconds slow{2000};  ///< requests that take longer are told in the log
+};
+
+/// What `kdd serve` runs: DICOMweb over the archive that the process's settings name. Used by one thread.
+class Server
+{
+public:
+    /// Null, with the reason in `result`, when the settings cannot be followed. Until it is known who may see what,
+    /// that includes every address that other machines reach.
+    static std::unique_ptr<Server> make(ServerSettings settings, Result& result);
+
+    /// Stops.
+    ~Server();
+
+    /// On failure nothing has begun.
+    Result start();
+
+    /// Returns when the requests in flight are answered, or their time is over.
+    void stop();
+
+    /// "http://127.0.0.1:8042"
+    QByteArray address() const;
+
+    /// Empty when there is no such listener.
+    QByteArray statusAddress() const;
+
+private:
+    struct Private;
+
+    explicit Server(std::unique_ptr<Private> made);
+
+    std::unique_ptr<Private> d;
+};
+
+}  // namespace Kdd

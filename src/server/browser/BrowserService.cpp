@@ -1,0 +1,141 @@
+#include "server/browser/BrowserService.h"
+
+#include "server/browser/CorrectionJson.h"
+#include "server/browser/PageAnswer.h"
+#include "server/browser/StudyAnswer.h"
+#include "server/browser/StudySizes.h"
+
+#include <kddlib/TagFile.h>
+
+namespace Kdd::Browser
+{
+namespace
+{
+
+constexpr const char* kMethods = "GET, HEAD, OPTIONS";
+
+// Some writers give studies names that are no UIDs. They are found under any name that the image database takes [bytes].
+constexpr int kMaxStudyName = 256;
+
+// Seconds after which a study that is being written is asked for again.
+constexpr const char* kPatience = "2";
+
+// The page and its modules, and nothing else: no script or style inside the page, none from elsewhere, and no text that
+// becomes markup. What a value of a DICOM file says is then only ever shown.
+constexpr const char* kPolicy =
+    "default-src 'none'; script-src 'self'; style-src 'self'; img-src 'self'; "
+    "connect-src 'self'; base-uri 'none'; form-action 'none'; frame-ancestors 'none'; "
+    "require-trusted-types-for 'script'; trusted-types 'none'";
+
+void addSafety(Http::Response& response)
+{
+    response.addHeader("Content-Security-Policy", kPolicy);
+    response.addHeader("Referrer-Policy", "no-referrer");
+    response.addHeader("Cross-Origin-Resource-Policy", "same-origin");
+    response.addHeader("X-Frame-Options", "DENY");
+}
+
+Http::Response methodsOnly(int status)
+{
+    Http::Response response(status);
+    response.addHeader("Allow", kMethods);
+    return response;
+}
+
+Http::Response notFound()
+{
+    return Http::failure(404, QStringLiteral("The study browser has nothing under this path"));
+}
+
+Http::Response notThere(DicomWeb::Presence presence)
+{
+    if (presence == DicomWeb::Presence::Absent)
+        return Http::failure(404, QStringLiteral("There is no such study"));
+    if (presence == DicomWeb::Presence::Damaged)
+        return Http::failure(500, QStringLiteral("The study's tag file cannot be read"));
+    Http::Response response = Http::failure(503, QStringLiteral("The study is being written; ask again"));
+    response.addHeader("Retry-After", kPatience);
+    return response;
+}
+
+}  // namespace
+
+BrowserService::BrowserService(DicomWeb::StudyShelf& shelf, const BrowserSettings& settings)
+    : mShelf(shelf)
+    , mSettings(settings)
+{
+}
+
+Http::Response BrowserService::answer(const Http::Request& request)
+{
+    const bool isRead = request.method == Http::Method::Get || request.method == Http::Method::Head;
+    Http::Response response =
+        isRead ? find(request) : methodsOnly(request.method == Http::Method::Options ? 204 : 405);
+    addSafety(response);
+    return response;
+}
+
+Http::Response BrowserService::find(const Http::Request& request) const
+{
+    const QVector<QByteArray>& path = request.path;
+    if (path.isEmpty())
+        return pageAnswer(request, "index.html");
+    if (path.size() == 2 && path[0] == "page")
+        return pageAnswer(request, path[1]);
+    if (path.size() == 2 && path[0] == "browser" && path[1] == "config")
+        return config(request);
+    if (path.size() >= 3 && path[0] == "browser" && path[1] == "studies" && path[2].size() <= kMaxStudyName)
+        return study(request, path[2], path.mid(3));
+    return notFound();
+}
+
+Http::Response BrowserService::config(const Http::Request& request) const
+{
+    return jsonAnswer(request, {{QStringLiteral("dicomWeb"), QString::fromUtf8(mSettings.dicomWeb)},
+                                {QStringLiteral("viewer"), mSettings.hasViewer},
+                                {QStringLiteral("thumbnails"), mSettings.hasThumbnails}});
+}
+
+Http::Response BrowserService::lookAt(const QByteArray& uid, const Look& look) const
+{
+    std::shared_ptr<const DicomWeb::ServedStudy> study;
+    const DicomWeb::Presence presence = mShelf.find(uid, study);
+    if (presence != DicomWeb::Presence::Found)
+        return notThere(presence);
+    return study->look([&](const TagFile& file) { return look(file, study->version()); });
+}
+
+Http::Response BrowserService::sizes(const Http::Request& request, const QByteArray& uid) const
+{
+    StudyFiles files;
+    Http::Response response = lookAt(uid, [&](const TagFile& file, const QByteArray&) {
+        files = filesOf(file);
+        return Http::Response();
+    });
+    // The files are looked at when others may have the tree again: there can be thousands, on a slow disk.
+    return response.status == 200 ? jsonAnswer(request, sizesJson(files)) : std::move(response);
+}
+
+Http::Response BrowserService::study(const Http::Request& request, const QByteArray& uid,
+                                     const Rest& rest) const
+{
+    if (rest == Rest{"sizes"})
+        return sizes(request, uid);
+    return lookAt(uid, [&](const TagFile& file, const QByteArray& version) {
+        if (rest.isEmpty())
+            return jsonAnswer(request, studyJson(file));
+        if (rest == Rest{"corrections"})
+            return jsonAnswer(request, correctionsOf(file));
+        if (rest == Rest{"difference"})
+            return differenceAnswer(request, file);
+        if (rest == Rest{"preview"})
+            return studyPreview(request, file, version);
+        if (rest.size() >= 3 && rest[0] == "series")
+            return seriesAnswer(request, file, version, rest.mid(1));
+        if (rest.size() == 3 && rest[0] == "images")
+            return imageAnswer(request, file, version, rest.mid(1));
+        return notFound();
+    });
+}
+
+}  // namespace Kdd::Browser

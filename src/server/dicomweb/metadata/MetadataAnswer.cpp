@@ -1,0 +1,105 @@
+#include "server/dicomweb/metadata/MetadataAnswer.h"
+
+#include "server/http/GzipEncoder.h"
+
+namespace Kdd::DicomWeb
+{
+namespace
+{
+
+// So few images are written faster than a file is opened, and their length is known before the first byte goes.
+constexpr int kFew = 4;
+
+class PlainProducer : public Http::Producer
+{
+public:
+    explicit PlainProducer(std::unique_ptr<MetadataText> text)
+        : mText(std::move(text))
+    {
+    }
+
+    Result next(QByteArray& block) override
+    {
+        block.resize(0);
+        mText->next(block);
+        return {};
+    }
+
+private:
+    std::unique_ptr<MetadataText> mText;
+};
+
+class GzipProducer : public Http::Producer
+{
+public:
+    GzipProducer(std::unique_ptr<MetadataText> text, KeptAnswers& kept, const QByteArray& name)
+        : mText(std::move(text))
+        , mKept(kept)
+        , mName(name)
+    {
+    }
+
+    Result next(QByteArray& block) override
+    {
+        // Nothing is begun for whoever asks for the head alone.
+        if (!mIsBegun)
+            mDraft = mKept.begin(mName);
+        mIsBegun = true;
+        block.resize(0);
+        // An empty block would be the end, so texts that give nothing yet are followed by the next.
+        while (block.isEmpty() && !mIsEnded) {
+            mPlain.resize(0);
+            mIsEnded = !mText->next(mPlain);
+            if (mIsEnded)
+                mEncoder.finish(block);
+            else
+                mEncoder.add(mPlain, block);
+        }
+        if (mDraft != nullptr)
+            mDraft->write(block);
+        if (mDraft != nullptr && mIsEnded) {
+            mDraft->keep();
+            mDraft.reset();
+        }
+        return {};
+    }
+
+private:
+    std::unique_ptr<MetadataText> mText;
+    KeptAnswers& mKept;
+    QByteArray mName;
+    Http::GzipEncoder mEncoder;
+    QByteArray mPlain;
+    std::unique_ptr<KeptAnswers::Draft> mDraft;
+    bool mIsBegun = false;
+    bool mIsEnded = false;
+};
+
+QByteArray wholeBody(MetadataText& text, bool takesGzip)
+{
+    QByteArray plain;
+    while (text.next(plain)) {
+    }
+    if (!takesGzip)
+        return plain;
+    QByteArray compressed;
+    Http::GzipEncoder encoder;
+    encoder.add(plain, compressed);
+    encoder.finish(compressed);
+    return compressed;
+}
+
+}  // namespace
+
+void addBody(Http::Response& response, std::unique_ptr<MetadataText> text, bool takesGzip, KeptAnswers& kept,
+             const QByteArray& name)
+{
+    if (text->count() <= kFew)
+        response.body.emplace_back(wholeBody(*text, takesGzip));
+    else if (takesGzip)
+        response.body.emplace_back(std::make_unique<GzipProducer>(std::move(text), kept, name));
+    else
+        response.body.emplace_back(std::make_unique<PlainProducer>(std::move(text)));
+}
+
+}  // namespace Kdd::DicomWeb

@@ -1,0 +1,119 @@
+#include "server/dicomweb/metadata/MetadataResource.h"
+
+#include "server/dicomweb/metadata/MetadataAnswer.h"
+#include "server/dicomweb/metadata/MetadataText.h"
+
+#include <QList>
+
+namespace Kdd::DicomWeb
+{
+namespace
+{
+
+/// Under which an answer is kept, and by which clients know it.
+QByteArray nameOf(const MetadataRequest& metadata, const QByteArray& version)
+{
+    return version + '-' + metadata.digest();
+}
+
+/// Compressed bytes are other bytes.
+QByteArray entityTag(const MetadataRequest& metadata, const QByteArray& version)
+{
+    return '"' + nameOf(metadata, version) + (metadata.takesGzip ? "-gzip\"" : "\"");
+}
+
+/// Whether the client has what the tag stands for. `any`: "*" counts, which says no more than that there is something.
+bool hasEntity(const Http::Request& request, const QByteArray& tag, bool any)
+{
+    const QList<QByteArray> tags = request.header("if-none-match").split(',');
+    for (const QByteArray& each : tags) {
+        const QByteArray held = each.trimmed();
+        if (held == tag || held == "W/" + tag || (any && held == "*"))
+            return true;
+    }
+    return false;
+}
+
+Http::Response withTag(int status, const QByteArray& tag)
+{
+    Http::Response response(status);
+    response.addHeader("ETag", tag);
+    response.addHeader("Vary", "Accept, Accept-Encoding");
+    // To be asked for again each time, which costs little: corrections count at once.
+    response.addHeader("Cache-Control", "private, no-cache");
+    return response;
+}
+
+Http::Response notThere(Presence presence)
+{
+    switch (presence) {
+    case Presence::Held: {
+        Http::Response response = Http::failure(503, QStringLiteral("The study is being changed; ask again"));
+        response.addHeader("Retry-After", "2");
+        return response;
+    }
+    case Presence::Damaged:
+        return Http::failure(500, QStringLiteral("The study's tag file is damaged"));
+    default:
+        return Http::failure(404, QStringLiteral("No such study"));
+    }
+}
+
+}  // namespace
+
+bool MetadataResource::owns(const ResourcePath& path) const
+{
+    return path.resource == "metadata" && !path.study.isEmpty() && path.rest.isEmpty();
+}
+
+Http::Response MetadataResource::answer(const Http::Request& request, const ResourcePath& path)
+{
+    MetadataRequest metadata;
+    int status = 0;
+    QString reason;
+    if (!metadata.read(request, path, status, reason))
+        return Http::failure(status, reason);
+
+    // The version alone answers whoever has the answer already or gets one that is kept: both exist only of what was
+    // there in this version.
+    QByteArray version;
+    Presence presence = mStudies.version(path.study, version);
+    if (presence != Presence::Found)
+        return notThere(presence);
+    const QByteArray tag = entityTag(metadata, version);
+    if (hasEntity(request, tag, false))
+        return withTag(304, tag);
+    Http::FileRange kept;
+    if (metadata.takesGzip && mKept.find(nameOf(metadata, version), kept)) {
+        Http::Response response = withTag(200, tag);
+        response.addHeader("Content-Type", metadata.contentType());
+        response.addHeader("Content-Encoding", "gzip");
+        response.body.emplace_back(std::move(kept));
+        return response;
+    }
+    std::shared_ptr<const ServedStudy> study;
+    presence = mStudies.find(path.study, study);
+    return presence == Presence::Found ? answerFrom(std::move(study), request, metadata) : notThere(presence);
+}
+
+Http::Response MetadataResource::answerFrom(std::shared_ptr<const ServedStudy> study,
+                                            const Http::Request& request, const MetadataRequest& metadata)
+{
+    // Of this state, which may be a later one than was asked about first.
+    const QByteArray version = study->version();
+    const QByteArray tag = entityTag(metadata, version);
+    auto text = std::make_unique<MetadataText>(std::move(study), metadata);
+    if (text->count() == 0)
+        return Http::failure(404, metadata.path.instance.isEmpty() ? QStringLiteral("No such series")
+                                                                   : QStringLiteral("No such instance"));
+    if (hasEntity(request, tag, true))
+        return withTag(304, tag);
+    Http::Response response = withTag(200, tag);
+    response.addHeader("Content-Type", metadata.contentType());
+    if (metadata.takesGzip)
+        response.addHeader("Content-Encoding", "gzip");
+    addBody(response, std::move(text), metadata.takesGzip, mKept, nameOf(metadata, version));
+    return response;
+}
+
+}  // namespace Kdd::DicomWeb

@@ -1,0 +1,26 @@
+#pragma once
+
+#include "server/dicomweb/Resource.h"
+#include "server/dicomweb/StudyShelf.h"
+
+namespace Kdd::DicomWeb
+{
+
+/// Small pictures for lists: ".../thumbnail" of a study, a series, an instance or a frame. From the previews that the tag
+/// file holds; drawn from the DICOM file only for an image that has none of its own.
+class ThumbnailResource : public Resource
+{
+public:
+    explicit ThumbnailResource(StudyShelf& studies)
+        : mStudies(studies)
+    {
+    }
+
+    bool owns(const ResourcePath& path) const override;
+    Http::Response answer(const Http::Request& request, const ResourcePath& path) override;
+
+private:
+    StudyShelf& mStudies;
+};
+
+}  // namespace Kdd::DicomWeb

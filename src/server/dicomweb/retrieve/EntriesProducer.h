@@ -1,0 +1,53 @@
+#pragma once
+
+#include "server/dicomweb/retrieve/Verdict.h"
+#include "server/http/Packing.h"
+
+#include <deque>
+#include <functional>
+#include <memory>
+#include <vector>
+
+namespace Kdd::DicomWeb
+{
+
+/// One of the bodies that an answer packs.
+struct Entry
+{
+    QByteArray name;
+    QByteArray mediaType;
+    std::vector<Http::BodyPart> body;
+};
+
+/// Sends many bodies packed into one. They are made image by image as they are sent, so that no more than those of one
+/// image take memory.
+class EntriesProducer : public Http::Producer
+{
+public:
+    /// Makes what is sent of the image of that number (0-based).
+    using Maker = std::function<Verdict(int image, std::vector<Entry>& entries)>;
+
+    EntriesProducer(int images, Maker make, std::unique_ptr<Http::Packing> packing)
+        : mImages(images)
+        , mMake(std::move(make))
+        , mPacking(std::move(packing))
+    {
+    }
+
+    Result next(QByteArray& block) override;
+
+private:
+    Result step(QByteArray& block);
+    Result takeFrom(Http::BodyPart& part, QByteArray& block, bool& isDone);
+
+    int mImages;
+    Maker mMake;
+    std::unique_ptr<Http::Packing> mPacking;
+    int mNextImage = 0;
+    std::deque<Entry> mEntries;  // of the present image, the first half sent perhaps
+    std::deque<Http::BodyPart> mBody;  // what is left of the entry that has begun
+    bool mHasBegun = false;
+    bool mIsFinished = false;
+};
+
+}  // namespace Kdd::DicomWeb

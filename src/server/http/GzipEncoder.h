@@ -1,0 +1,29 @@
+#pragma once
+
+#include <QByteArray>
+
+#include <memory>
+
+namespace Kdd::Http
+{
+
+/// Compresses a body that is made block by block, with little memory. The same blocks give the same bytes. Used by one
+/// thread at a time.
+class GzipEncoder
+{
+public:
+    GzipEncoder();
+    ~GzipEncoder();
+
+    /// Appends to `out` what is ready of the blocks until now; seldom all of it.
+    void add(const QByteArray& block, QByteArray& out);
+
+    /// Appends the rest. Nothing may be added any more.
+    void finish(QByteArray& out);
+
+private:
+    struct Private;
+    std::unique_ptr<Private> d;
+};
+
+}  // namespace Kdd::Http

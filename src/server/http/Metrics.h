@@ -1,0 +1,66 @@
+#pragma once
+
+#include "server/http/Exchange.h"
+
+#include <array>
+#include <atomic>
+#include <functional>
+#include <map>
+#include <mutex>
+#include <tuple>
+
+namespace Kdd::Http
+{
+
+/// What a server counts, for a program that asks for it at intervals. May be used on any thread.
+class Metrics
+{
+public:
+    /// A number that only grows, and lives as long as this. Whoever asks for the same name and label gets the same one.
+    /// `name` is what Prometheus takes ("kdd_cache_hits_total"), `label` empty or "cache=\"metadata\"", and `help` one line.
+    std::atomic<qint64>& counter(const QByteArray& name, const QByteArray& help,
+                                 const QByteArray& label = {});
+
+    /// A number that is asked for when it is needed, on any thread, as long as this lives.
+    void addGauge(const QByteArray& name, const QByteArray& help, std::function<qint64()> value);
+
+    /// `group` is one of few, and never made of what a client sends.
+    void count(const QByteArray& group, const Exchange& exchange);
+
+    /// All of them, as Prometheus reads them.
+    QByteArray text() const;
+
+private:
+    static constexpr std::size_t kBuckets = 12;
+
+    struct Latency
+    {
+        std::array<qint64, kBuckets + 1> counts{};  // the last one of those that took longer
+        qint64 bytes = 0;
+        double seconds = 0;
+    };
+
+    struct Family
+    {
+        QByteArray help;
+        std::map<QByteArray, std::atomic<qint64>> values;  // by label
+    };
+
+    struct Gauge
+    {
+        QByteArray name;
+        QByteArray help;
+        std::function<qint64()> value;
+    };
+
+    QByteArray requestsText() const;
+    QByteArray latencyText() const;
+
+    mutable std::mutex mMutex;
+    std::map<QByteArray, Family> mCounters;  // by name
+    std::vector<Gauge> mGauges;
+    std::map<std::tuple<QByteArray, Method, int>, qint64> mRequests;  // by group, method, status
+    std::map<QByteArray, Latency> mLatencies;                         // by group
+};
+
+}  // namespace Kdd::Http

@@ -1,0 +1,70 @@
+#pragma once
+
+#include "server/http/Request.h"
+
+#include <memory>
+
+namespace Kdd::Http
+{
+
+/// Makes requests of the bytes that a client sends: one after the other, as several may come at once.
+class RequestReader
+{
+public:
+    /// How much of one request is taken [bytes].
+    struct Limits
+    {
+        unsigned header = 0;
+        qint64 body = 0;
+    };
+
+    enum class State {
+        Between,      ///< nothing of the next request is there
+        Begun,        ///< more of it has to come
+        AwaitsLeave,  ///< the client holds its body back until it is told to go on
+        Whole,
+        Refused,  ///< nothing more can be read from this client
+    };
+
+    explicit RequestReader(Limits limits);
+    ~RequestReader();
+
+    void add(const char* bytes, int size);
+
+    /// Goes on with what is there.
+    State advance();
+
+    /// The status that tells the client why it was refused, and what was understood before.
+    int refusal() const { return mRefusal; }
+
+    /// The request that is whole, or what is known of one that is not; without base, peer and id. Its body was read and
+    /// let go: nothing that is answered here has one. The next call of `advance` begins with the next request.
+    Request take();
+
+    // Of the request that was taken last.
+
+    /// Whether its sender wants the connection to stay.
+    bool keepsConnection() const { return mKeepsConnection; }
+
+    /// HTTP/1.0, whose bodies end with the connection where their length is not known.
+    bool isOldVersion() const { return mIsOldVersion; }
+
+    /// The host that the request is for, with its port where it names one. Never empty but for HTTP/1.0.
+    const QByteArray& host() const { return mHost; }
+
+private:
+    struct Private;
+
+    State refuse(int status);
+    State finish();
+
+    Limits mLimits;
+    std::unique_ptr<Private> d;
+    Request mRequest;
+    QByteArray mHost;
+    int mRefusal = 0;
+    bool mKeepsConnection = false;
+    bool mIsOldVersion = false;
+};
+
+}  // namespace Kdd::Http

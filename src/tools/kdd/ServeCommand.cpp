@@ -1,0 +1,209 @@
+#include "server/Server.h"
+#include "tools/kdd/Commands.h"
+#include "tools/kdd/Report.h"
+
+#include <QFile>
+
+#include <kddlib/ExResource.h>
+#include <kddlib/Kxg.h>
+#include <kddlib/LogFile.h>
+#include <kddlib/PathName.h>
+
+#include <algorithm>
+#include <csignal>
+#include <cstdio>
+#include <memory>
+#include <thread>
+
+namespace Kdd
+{
+
+namespace
+{
+
+/// What is empty or 0 is left to the site's settings.
+struct ServeRequest
+{
+    QByteArray listen;
+    QByteArray status;
+    QString certificate;
+    QString key;
+    int threads = 0;
+    QString viewer;
+    QByteArray publicAddress;
+    QList<QByteArray> hosts;
+};
+
+/// While it lives the signals that end a process wait to be asked for, by threads that are started meanwhile too.
+class EndSignals
+{
+public:
+    EndSignals()
+    {
+        sigemptyset(&mSignals);
+        sigaddset(&mSignals, SIGINT);
+        sigaddset(&mSignals, SIGTERM);
+        ::pthread_sigmask(SIG_BLOCK, &mSignals, &mFormer);
+    }
+    ~EndSignals() { ::pthread_sigmask(SIG_SETMASK, &mFormer, nullptr); }
+    EndSignals(const EndSignals&) = delete;
+    EndSignals& operator=(const EndSignals&) = delete;
+
+    /// Returns with the first one; a second one ends the process.
+    void await() const
+    {
+        int signal = 0;
+        ::sigwait(&mSignals, &signal);
+        std::signal(SIGINT, SIG_DFL);
+        std::signal(SIGTERM, SIG_DFL);
+        ::pthread_sigmask(SIG_UNBLOCK, &mSignals, nullptr);
+    }
+
+private:
+    sigset_t mSignals = {};
+    sigset_t mFormer = {};
+};
+
+QVector<QByteArray> wordsOf(QByteArray text)
+{
+    QVector<QByteArray> words;
+    for (const QByteArray& word : text.replace(',', ' ').split(' '))
+        if (!word.isEmpty())
+            words.append(word);
+    return words;
+}
+
+QByteArray orElse(const QByteArray& given, const QByteArray& setting)
+{
+    return given.isEmpty() ? setting : given;
+}
+
+bool readAddress(const QByteArray& text, Http::ListenAddress& address)
+{
+    if (Http::ListenAddress::parse(text, address))
+        return true;
+    LogFile::errorf("\"%s\" is no address to listen at: write one like 127.0.0.1:8042 or [::1]:8042",
+                    text.constData());
+    return false;
+}
+
+bool readTls(const ServeRequest& request, Http::HttpSettings& http)
+{
+    http.certificateFile = orElse(pathBytes(request.certificate), ExResource::serverCertificate());
+    http.keyFile = orElse(pathBytes(request.key), ExResource::serverKey());
+    if (http.certificateFile.isEmpty() == http.keyFile.isEmpty())
+        return true;
+    LogFile::errorf("TLS takes both a certificate and a key");
+    return false;
+}
+
+int threadCount(const ServeRequest& request)
+{
+    const int wanted = request.threads > 0 ? request.threads : ExResource::serverThreads();
+    return wanted > 0 ? wanted : std::max(4, 2 * static_cast<int>(std::thread::hardware_concurrency()));
+}
+
+void readLimits(const ServeRequest& request, Http::HttpSettings& http)
+{
+    http.workers = threadCount(request);
+    http.connections = ExResource::serverConnections();
+    http.requests = ExResource::serverRequests();
+    http.patience = std::chrono::seconds(ExResource::serverPatience());
+    http.stop = std::chrono::seconds(ExResource::serverStop());
+}
+
+/// False, with the reason logged, when something is written that is none.
+bool readSettings(const ServeRequest& request, ServerSettings& settings)
+{
+    const QByteArray status = orElse(request.status, ExResource::serverStatus());
+    if (!readAddress(orElse(request.listen, ExResource::serverListen()), settings.http.address) ||
+        (!status.isEmpty() && !readAddress(status, settings.status.emplace())) ||
+        !readTls(request, settings.http))
+        return false;
+    readLimits(request, settings.http);
+    settings.prefix = ExResource::serverPrefix();
+    settings.viewer =
+        request.viewer.isEmpty() ? QFile::decodeName(ExResource::serverViewer()) : request.viewer;
+    settings.slow = std::chrono::milliseconds(ExResource::serverSlow());
+    settings.addresses.publicAddress = orElse(request.publicAddress, ExResource::serverPublicAddress());
+    settings.addresses.hosts = wordsOf(ExResource::serverHosts()) + request.hosts.toVector();
+    settings.addresses.proxies = wordsOf(ExResource::serverProxies());
+    return true;
+}
+
+void tellAddress(const GlobalOptions& options, const Server& server)
+{
+    const QString address = QString::fromLatin1(server.address());
+    const QString status = QString::fromLatin1(server.statusAddress());
+    if (options.json) {
+        printJson({{QStringLiteral("address"), address}, {QStringLiteral("status"), status}});
+    } else {
+        std::printf("Serving at %s\n", qUtf8Printable(address));
+        if (!status.isEmpty())
+            std::printf("Watched at %s\n", qUtf8Printable(status));
+    }
+    std::fflush(stdout);
+}
+
+/// A server may come before its database does, so that this is no reason not to begin.
+void warnOfNoArchive()
+{
+    Result result;
+    if (Kxg::Catalogue::openExisting(Kxg::DatabaseServer(), result) == nullptr)
+        LogFile::warnf("There is no archive here yet: %s", qUtf8Printable(result.text()));
+}
+
+Outcome runServe(const GlobalOptions& options, const ServeRequest& request)
+{
+    ServerSettings settings;
+    if (!readSettings(request, settings))
+        return Outcome::WrongUsage;
+    const EndSignals end;
+    Result result;
+    const std::unique_ptr<Server> server = Server::make(settings, result);
+    if (server != nullptr)
+        result = server->start();
+    if (result.bad()) {
+        LogFile::errorf("Cannot serve: %s", qUtf8Printable(result.text()));
+        return Outcome::Failed;
+    }
+    warnOfNoArchive();
+    tellAddress(options, *server);
+    end.await();
+    server->stop();
+    return Outcome::Done;
+}
+
+}  // namespace
+
+void declareServe(CommandSet& commands)
+{
+    const CommandText text = {
+        "serve", kServing, "Answer DICOMweb requests over HTTP",
+        "Runs until it is interrupted, and answers the requests in flight before it ends. It listens only "
+        "where no "
+        "other machine reaches it. What has no option here is a setting of the site, as each option is.",
+        "kdd serve\n"
+        "kdd serve --viewer viewer --public https://images.example.org"};
+    const auto request = std::make_shared<ServeRequest>();
+    ArgumentList arguments = commands.declare(
+        text, [request](const GlobalOptions& options) { return runServe(options, *request); });
+    arguments.text({"--listen", kListenAddress, "Where to wait for requests (default: 127.0.0.1:8042)"},
+                   request->listen);
+    arguments.text(
+        {"--status", kListenAddress, "Where to answer /healthz, /readyz and /metrics (default: nowhere)"},
+        request->status);
+    arguments.path({"--tls-cert", kFile, "Certificate and those above it, in PEM (default: no TLS)"},
+                   request->certificate);
+    arguments.path({"--tls-key", kFile, "The certificate's key, in PEM"}, request->key);
+    arguments.number("--threads", 1, 1000, request->threads,
+                     "Requests answered at a time (default: twice the processors, at least 4)");
+    arguments.path({"--viewer", kFolder, "Folder of a viewer's files, served under /viewer"},
+                   request->viewer);
+    arguments.text({"--public", kUrl, "Address under which clients reach the server"},
+                   request->publicAddress);
+    arguments.texts({"--host", "NAME", "Further name by which the server may be asked; may be repeated"},
+                    request->hosts);
+}
+
+}  // namespace Kdd

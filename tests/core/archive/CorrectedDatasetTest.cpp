@@ -1,0 +1,252 @@
+#include "kddlib/archive/CorrectedDataset.h"
+
+#include "kddlib/Limits.h"
+#include "kddlib/archive/DatasetVerifier.h"
+#include "kddlib/items/RegularFile.h"
+#include "kddlib/net/dicom/DicomFileReader.h"
+#include "kddlib/tagfile/qa/QAAudit.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
+#include "kddlib/tagmodel/TagMap.h"
+#include "kddlib/tagmodel/TagSequence.h"
+#include "support/ByteSource.h"
+#include "support/DatasetBuilder.h"
+#include "support/RealFiles.h"
+
+#include <QTemporaryDir>
+
+#include <dcmtk/dcmdata/dctk.h>
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <memory>
+
+using namespace Kdd;
+
+namespace
+{
+
+using Map = std::unique_ptr<TagMap>;
+
+QByteArray wholeOf(const CorrectedDataset& dataset, ByteSource& source, const FrameIndex& index)
+{
+    using Pixels = CorrectedDataset::Pixels;
+    QByteArray bytes = dataset.head();
+    if (dataset.pixels() == Pixels::Stored)
+        bytes += source.bytes().mid(static_cast<int>(index.pixelValue().offset),
+                                    static_cast<int>(index.pixelValue().length));
+    DecodedPixels pixels(source, index);
+    QByteArray block;
+    while (dataset.pixels() == Pixels::Decoded) {
+        const Result decoded = pixels.next(block);
+        EXPECT_TRUE(decoded.good()) << qPrintable(decoded.text());
+        if (decoded.bad() || block.isEmpty())
+            break;
+        bytes += block;
+    }
+    return bytes + dataset.tail();
+}
+
+/// The faults that a check of the archive would find; "" for none.
+std::string faultsOf(const QByteArray& bytes, const TagMap& image, bool isDecoded = false)
+{
+    DcmFileFormat file;
+    std::string faults;
+    const OFCondition read = readDicomBuffer(bytes, file);
+    if (read.bad())
+        return std::string("cannot be read: ") + read.text();
+    verifyDataset(*file.getDataset(), image, [&](const QByteArray& path, const QByteArray& fault) {
+        // What decoding is there to change, and numbers whose sign is told only where their VR has to be written.
+        const bool isPixels = path == "(0028,0004)" || path == "(0028,0006)" || path == "(7fe0,0010)" ||
+                              path == "(7fe0,0001)" || path == "(7fe0,0002)";
+        const bool isWanted = (isDecoded && isPixels) || fault.endsWith("in the tag file xs");
+        faults += isWanted ? std::string() : (path + ' ' + fault + '\n').toStdString();
+    });
+    return faults;
+}
+
+std::string uidInMeta(const QByteArray& bytes)
+{
+    DcmFileFormat file;
+    OFString uid;
+    readDicomBuffer(bytes, file);
+    file.getMetaInfo()->findAndGetOFString(DCM_MediaStorageSOPInstanceUID, uid);
+    return uid;
+}
+
+/// A frame of it is smaller than its image, or is no whole codestream.
+bool isDamaged(const QString& path)
+{
+    return path.endsWith(QLatin1String("multiframe/sc/multiframe.dcm")) ||
+           path.endsWith(QLatin1String("JPEG2000-embedded-sequence-delimiter.dcm"));
+}
+
+struct RealImage
+{
+    explicit RealImage(const QString& path)
+        : source(ByteSource::ofFile(path))
+    {
+        QByteArray converted;
+        if (index.read(source).bad() && readAsRegularFile(path.toLocal8Bit(), converted).good())
+            source = ByteSource(converted);
+        isUsable = index.read(source).good() && readDicomBuffer(source.bytes(), file).good();
+        if (isUsable)
+            image.reset(TagMap::createTagMap(file.getDataset(), kDefaultValueBound));
+    }
+
+    ByteSource source;
+    FrameIndex index;
+    DcmFileFormat file;
+    Map image;
+    bool isUsable = false;
+};
+
+class RealDatasets : public testing::Test
+{
+protected:
+    void SetUp() override
+    {
+        if (realFilesFolder().isEmpty())
+            GTEST_SKIP() << "KDD_TEST_DATA is not set";
+        for (const char* folder : {"transfer-syntaxes", "multiframe", "modalities", "charsets", "odd"})
+            mPaths += realFiles(folder);
+    }
+
+    QStringList mPaths;
+};
+
+TEST_F(RealDatasets, AreGivenAsTheirFilesAreUntilTheyAreCorrected)
+{
+    int asInFile = 0;
+    for (const QString& path : mPaths) {
+        RealImage real(path);
+        CorrectedDataset dataset;
+        if (!real.isUsable)
+            continue;
+        const QByteArray syntax = real.index.transferSyntaxUID();
+        ASSERT_TRUE(dataset.make(real.source, real.index, *real.image, syntax).good()) << qPrintable(path);
+        EXPECT_TRUE(dataset.isAsInFile()) << qPrintable(path);
+        EXPECT_EQ(faultsOf(wholeOf(dataset, real.source, real.index), *real.image), "") << qPrintable(path);
+        asInFile += dataset.isAsInFile() ? 1 : 0;
+    }
+    EXPECT_GT(asInFile, 200);
+}
+
+TEST_F(RealDatasets, ShowWhatTheTagFileShowsInEverySyntax)
+{
+    int decoded = 0;
+    for (const QString& path : mPaths) {
+        RealImage real(path);
+        if (!real.isUsable)
+            continue;
+        real.image->putAndInsertString(DCM_PatientName, "Corrected^Name");
+        real.image->deleteElement(DCM_StudyDate);
+        real.image->putAndInsertString(DCM_SOPInstanceUID, "1.2.3.4.5.6.7");
+        for (const QByteArray& syntax : {real.index.transferSyntaxUID(), QByteArray("1.2.840.10008.1.2.1"),
+                                         QByteArray("1.2.840.10008.1.2")}) {
+            const bool isDecoded = real.index.isEncapsulated() && syntax != real.index.transferSyntaxUID();
+            // Without VRs what the dictionary does not know loses its own.
+            const bool isLoss = syntax == "1.2.840.10008.1.2" && real.index.transferSyntaxUID() != syntax;
+            CorrectedDataset dataset;
+            if (isLoss || (isDecoded && (!real.index.canDecode() || isDamaged(path))))
+                continue;
+            const Result made = dataset.make(real.source, real.index, *real.image, syntax);
+            ASSERT_TRUE(made.good()) << qPrintable(path) << qPrintable(made.text());
+            EXPECT_FALSE(dataset.isAsInFile());
+            const QByteArray whole = wholeOf(dataset, real.source, real.index);
+            EXPECT_EQ(faultsOf(whole, *real.image, isDecoded), "") << qPrintable(path) << syntax.constData();
+            EXPECT_EQ(uidInMeta(whole), "1.2.3.4.5.6.7") << qPrintable(path);
+            decoded += isDecoded ? 1 : 0;
+        }
+    }
+    EXPECT_GT(decoded, 50);
+}
+
+class CorrectedDatasetTest : public testing::Test
+{
+protected:
+    CorrectedDatasetTest()
+    {
+        DatasetBuilder item = anItem().with(DCM_CodeMeaning, "wrong").withLong(DCM_TextValue, 5000);
+        mImage.with(DCM_PatientName, "Wrong^Name")
+            .withItem(DCM_ContentSequence, item)
+            .withLong(DCM_TextValue, 3000);
+        write();
+    }
+
+    void write()
+    {
+        DcmFileFormat file(&mImage.dataset());
+        const QByteArray path = mFolder.filePath(QStringLiteral("file.dcm")).toLocal8Bit();
+        ASSERT_TRUE(file.saveFile(path.constData(), EXS_LittleEndianExplicit).good());
+        mSource = ByteSource::ofFile(QString::fromLocal8Bit(path));
+        ASSERT_TRUE(mIndex.read(mSource).good());
+    }
+
+    Result make(const TagMap& image) { return mDataset.make(mSource, mIndex, image, "1.2.840.10008.1.2.1"); }
+
+    QTemporaryDir mFolder;
+    DatasetBuilder mImage = anImage();
+    ByteSource mSource = ByteSource({});
+    FrameIndex mIndex;
+    CorrectedDataset mDataset;
+};
+
+TEST_F(CorrectedDatasetTest, KeepsWhatWasLeftOutBesideACorrectionInAnItem)
+{
+    const Map map(mImage.map());
+    map->findElement(QStringLiteral("ContentSequence[0]"), DCM_CodeMeaning)->putValue(QByteArray("right"));
+    ASSERT_TRUE(make(*map).good());
+    const QByteArray whole = wholeOf(mDataset, mSource, mIndex);
+    EXPECT_EQ(faultsOf(whole, *map), "");
+    EXPECT_TRUE(whole.contains("right") && !whole.contains("wrong"));
+    EXPECT_TRUE(whole.contains(QByteArray(5000, 'x')));
+}
+
+TEST_F(CorrectedDatasetTest, RefusesAFileThatLacksWhatWasLeftOut)
+{
+    const Map map(mImage.map());
+    mImage.without(DCM_TextValue);
+    write();
+    EXPECT_FALSE(make(*map).good());
+    mImage.withLong(DCM_TextValue, 3000).without(DCM_ContentSequence);
+    write();
+    EXPECT_FALSE(make(*map).good());
+    mImage.withItem(DCM_ContentSequence, anItem().withLong(DCM_TextValue, 5000));
+    write();
+    EXPECT_TRUE(make(*map).good());
+}
+
+TEST_F(CorrectedDatasetTest, LeavesOwnAttributesOutAndTheAuditLogIn)
+{
+    const Map map(mImage.map());
+    AuditLog log;
+    log.append({QStringLiteral("1/1/2024 12:00:00 AM"),
+                {{DCM_PatientName, QStringLiteral("a"), QStringLiteral("b")}}});
+    map->putAndInsertValue(kFilePath, VrCode::LO, "/secret/place");
+    log.store(*map);
+    ASSERT_TRUE(make(*map).good());
+    const QByteArray whole = wholeOf(mDataset, mSource, mIndex);
+    EXPECT_FALSE(whole.contains("secret"));
+    EXPECT_TRUE(whole.contains(log.text().toBase64()));
+}
+
+TEST(ImageOrigin, IsWhatTheFileSaysBeforeAllCorrections)
+{
+    const Map map(anImage("1.2.9").map());
+    AuditLog log;
+    ImageOrigin origin;
+    EXPECT_FALSE(ImageOrigin::of(*map, origin).good()) << "no file is known";
+    map->putAndInsertValue(kFilePath, VrCode::LO, "/place");
+    const QString first = QStringLiteral("1.2.7");
+    log.append({QStringLiteral("1"), {{DCM_SOPInstanceUID, first, QStringLiteral("1.2.8")}}});
+    log.append(
+        {QStringLiteral("2"), {{DCM_SOPInstanceUID, QStringLiteral("1.2.8"), QStringLiteral("1.2.9")}}});
+    log.store(*map);
+    ASSERT_TRUE(ImageOrigin::of(*map, origin).good());
+    EXPECT_EQ(origin.sopInstanceUID, "1.2.7");
+    EXPECT_EQ(origin.studyInstanceUID, "1.2");
+    map->putAndInsertValue(AuditLog::keysIn(*map).first(), VrCode::UT, "no base64!");
+    EXPECT_FALSE(ImageOrigin::of(*map, origin).good());
+}
+
+}  // namespace

@@ -1,0 +1,294 @@
+#include "core/items/DatasetJson.h"
+#include "kddlib/Limits.h"
+#include "kddlib/items/DicomJson.h"
+#include "kddlib/net/dicom/DicomFileReader.h"
+#include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagmodel/OwnAttributes.h"
+#include "kddlib/tagmodel/TagElement.h"
+#include "kddlib/tagmodel/TagMap.h"
+#include "kddlib/tagmodel/TagSequence.h"
+#include "support/DatasetBuilder.h"
+#include "support/LogCapture.h"
+#include "support/RealFiles.h"
+
+#include <gtest/gtest.h>
+
+#include <cstring>
+#include <limits>
+#include <memory>
+#include <random>
+#include <sstream>
+
+using namespace Kdd;
+
+namespace
+{
+
+std::string expected(const TagMap& map, bool own = false)
+{
+    std::ostringstream out;
+    (own ? writeOwnDatasetJson : writeDatasetJson)(out, map, "a\"b");
+    return out.str();
+}
+
+std::string written(const TagMap& map, bool own = false)
+{
+    std::ostringstream out;
+    (own ? writeOwnDicomJson : writeDicomJson)(out, map, "a\"b");
+    return out.str();
+}
+
+/// Trees of all that a tag file may hold, each made of the same few attributes so that images share much.
+class RandomTree
+{
+public:
+    explicit RandomTree(unsigned int seed)
+        : mRandom(seed)
+    {
+    }
+
+    std::unique_ptr<TagFile> study()
+    {
+        auto file = std::make_unique<TagFile>();
+        mDeclares = oneIn(2);
+        for (int i = 0; i < 6; ++i) {
+            auto* image = new TagMap;
+            fill(*image, 0);
+            image->putAndInsertString(kFilePath, "/never/shown");
+            image->putAndInsertString(DCM_StudyInstanceUID, "1.2");
+            image->putAndInsertString(DCM_SeriesInstanceUID, oneIn(2) ? "1.3" : "1.4");
+            image->putAndInsertString(DCM_SOPInstanceUID, QByteArray::number(i + 1));
+            file->addTagMap(image, nullptr, true);
+        }
+        if (oneIn(2))
+            file->optimizeAll();
+        return file;
+    }
+
+private:
+    int below(int count) { return static_cast<int>(mRandom() % static_cast<unsigned int>(count)); }
+    bool oneIn(int count) { return below(count) == 0; }
+
+    template <typename T>
+    T oneOf(std::initializer_list<T> all)
+    {
+        return *(all.begin() + below(static_cast<int>(all.size())));
+    }
+
+    QByteArray text()
+    {
+        if (!oneIn(4))
+            return oneOf<const char*>({"",
+                                       "A",
+                                       "A\\B",
+                                       "Doe^John",
+                                       "Doe^J=X^Y=Z",
+                                       "12",
+                                       "-1.5",
+                                       "007",
+                                       "+3",
+                                       "1e3",
+                                       ".5",
+                                       " 5 ",
+                                       "1.2.840",
+                                       "5.",
+                                       "-0",
+                                       "--1",
+                                       "1\\\\2",
+                                       "\\",
+                                       "A\\",
+                                       "say \"x\"",
+                                       "1.2 .3",
+                                       "a  ",
+                                       "  a",
+                                       "^",
+                                       "A^",
+                                       "=",
+                                       "A==B",
+                                       "19990101",
+                                       "=PatientRootQuery",
+                                       "-",
+                                       "1.",
+                                       "1E-3",
+                                       "0.0",
+                                       "00.5",
+                                       "~",
+                                       "A\\B\\\\C"});
+        if (!mDeclares && oneIn(2))
+            return "plain";
+        return oneOf<const char*>({"M\xfcller", "M\xc3\xbcller", "\xbb\xee\xda", "\x1b$B;3ED\x1b(B",
+                                   "a\nb\tc\x01", "\xff\xfe", "\xd4\xcf\xc0\xde", "M\xfc\\N\xf6^x", "\x80",
+                                   "\x7f"});
+    }
+
+    QByteArray characterSet()
+    {
+        if (!mDeclares)
+            return oneOf<const char*>({"", "ISO_IR 6", "ISO_IR 100"});
+        return oneOf<const char*>({"", "ISO_IR 100", "ISO_IR 192", "ISO_IR 144", "GB18030",
+                                   "\\ISO 2022 IR 87", "ISO_IR 13", "ISO 2022 IR 13\\ISO 2022 IR 87",
+                                   "nonsense", "ISO_IR 6"});
+    }
+
+    QByteArray bytes()
+    {
+        const double doubles[] = {0,
+                                  -0.0,
+                                  1.5,
+                                  1e300,
+                                  1e-7,
+                                  1.0 / 3,
+                                  123456789,
+                                  std::numeric_limits<double>::infinity(),
+                                  -std::numeric_limits<double>::infinity(),
+                                  std::numeric_limits<double>::quiet_NaN()};
+        const float floats[] = {0.F, 1.5F, 3e30F, 1e-9F, 1.F / 3, -16777216.F};
+        QByteArray all;
+        for (int count = below(3); count > 0; --count) {
+            const double wide = doubles[below(10)];
+            const float narrow = floats[below(6)];
+            const quint64 number = (quint64(mRandom()) << 32) | mRandom();
+            char buffer[8];
+            std::memcpy(buffer, &wide, 8);
+            if (oneIn(3))
+                std::memcpy(buffer, &narrow, 4);
+            if (oneIn(3))
+                std::memcpy(buffer, &number, 8);
+            all.append(buffer, 8);
+        }
+        return all.left(all.size() - (oneIn(8) ? below(8) : 0));
+    }
+
+    DcmTagKey key()
+    {
+        return oneOf<DcmTagKey>({DCM_StudyDescription,
+                                 DCM_PatientName,
+                                 DCM_PatientComments,
+                                 DCM_Rows,
+                                 DCM_ImageType,
+                                 DCM_PixelSpacing,
+                                 DCM_InstanceNumber,
+                                 DCM_FrameIncrementPointer,
+                                 DCM_SmallestImagePixelValue,
+                                 DCM_RetrieveURL,
+                                 DCM_DoubleFloatPixelData,
+                                 DCM_SelectorSVValue,
+                                 DCM_SelectorUVValue,
+                                 DCM_SelectorOVValue,
+                                 DCM_LongCodeValue,
+                                 DCM_PixelData,
+                                 DCM_ReferencedSOPInstanceUID,
+                                 {0x0009, 0x0010},
+                                 {0x0009, 0x1001},
+                                 {0x0008, 0x0001},
+                                 {0x6000, 0x3000},
+                                 kFilePath,
+                                 DCM_LUTData});
+    }
+
+    VrCode vr()
+    {
+        return oneOf<VrCode>(
+            {VrCode::AE, VrCode::AS, VrCode::AT, VrCode::CS,      VrCode::DA,       VrCode::DS, VrCode::DT,
+             VrCode::FL, VrCode::FD, VrCode::IS, VrCode::LO,      VrCode::LT,       VrCode::OB, VrCode::OF,
+             VrCode::OW, VrCode::PN, VrCode::SH, VrCode::SL,      VrCode::SS,       VrCode::ST, VrCode::TM,
+             VrCode::UI, VrCode::UL, VrCode::US, VrCode::UT,      VrCode::Ox,       VrCode::Xs, VrCode::Lt,
+             VrCode::Up, VrCode::UN, VrCode::SQ, VrCode::Unknown, VrCode::PixelData});
+    }
+
+    void fill(TagMap& map, int depth)
+    {
+        for (int count = below(12); count > 0; --count) {
+            const VrCode code = vr();
+            map.putElement(key(), new TagElement(code, isTextVr(code) ? text() : bytes()));
+        }
+        for (int count = below(3); count > 0; --count)
+            map.putElement(key(), new TagElement(VrCode::LO, text()));
+        if (oneIn(4))
+            map.markAsOmitted(key());
+        if (depth == 0 ? !oneIn(4) : oneIn(mDeclares ? 4 : 40))
+            map.putElement(DCM_SpecificCharacterSet, new TagElement(VrCode::CS, characterSet()));
+        if (depth < 3 && oneIn(2)) {
+            auto* sequence = new TagSequence;
+            for (int items = below(3); items > 0; --items) {
+                auto* item = oneIn(20) ? nullptr : new TagMap;
+                if (item != nullptr)
+                    fill(*item, depth + 1);
+                sequence->addItem(item);
+            }
+            map.putElement(oneOf<DcmTagKey>({DCM_ReferencedImageSequence, {0x0009, 0x1002}}), sequence);
+        }
+    }
+
+    std::mt19937 mRandom;
+    bool mDeclares = false;
+};
+
+TEST(ImageWriter, EqualsTheWayByDatasetsForRandomTrees)
+{
+    const LogCapture log;
+    int different = 0;
+    for (unsigned int seed = 1; seed <= 400 && different < 5; ++seed) {
+        const std::unique_ptr<TagFile> file = RandomTree(seed).study();
+        DicomImageWriter writer(MetadataForm::Json);
+        for (const TagMap* image : file->imagesByUID()) {
+            QByteArray text("before");
+            writer.append(text, *image, "a\"b");
+            EXPECT_EQ(text.toStdString(), "before" + expected(*image)) << seed << (++different, "");
+            EXPECT_EQ(written(*image, true), expected(*image, true)) << seed << (++different, "");
+        }
+        for (const TagMap* series : file->seriesByUID())
+            EXPECT_EQ(written(*series), expected(*series)) << seed << (++different, "");
+    }
+}
+
+TEST(ImageWriter, WritesOnlyWhatIsWantedAndWhatNamesTheImage)
+{
+    DatasetBuilder image =
+        anImage("1.9").with(DCM_Rows, "512").with(DCM_PatientName, "Doe").with(DCM_PatientID, "7");
+    image.withItem(DCM_ReferencedImageSequence, anItem().with(DCM_PatientID, "8"));
+    const std::unique_ptr<TagMap> map(image.map());
+    QByteArray text;
+    DicomImageWriter(MetadataForm::Json, {DCM_Rows, DCM_ReferencedImageSequence}).append(text, *map, "root");
+    EXPECT_EQ(text.toStdString(),
+              R"({"00080005":{"vr":"CS","Value":["ISO_IR 192"]},"00080018":{"vr":"UI","Value":["1.9"]},)"
+              R"("00081140":{"vr":"SQ","Value":[{"00100020":{"vr":"LO","Value":["8"]}}]},)"
+              R"("0020000D":{"vr":"UI","Value":["1.2"]},"0020000E":{"vr":"UI","Value":["1.2.3"]},)"
+              R"("00280010":{"vr":"US","Value":[512]}})");
+}
+
+TEST(ImageWriter, WritesTheNativeModel)
+{
+    DatasetBuilder image = anItem().with(DCM_SpecificCharacterSet, "ISO_IR 100");
+    image.with(DCM_PatientName, "M\xfcller^J<&>=\xfc")
+        .with(DCM_PixelSpacing, "0.5\\0.5")
+        .with(DCM_Rows, "512");
+    image.withItem(DCM_ReferencedImageSequence, anItem().with(DCM_FrameIncrementPointer, "(0018,1063)"));
+    image.with(TagElement(VrCode::LO, "ACME").newDcmElement(DcmTag(0x0009, 0x0010, EVR_LO)).release());
+    image.with(TagElement(VrCode::OB, "ab").newDcmElement(DcmTag(0x0009, 0x1001, EVR_OB)).release());
+    const std::unique_ptr<TagMap> map(image.map());
+    map->markAsOmitted(DCM_PixelData);
+    QByteArray text;
+    DicomImageWriter(MetadataForm::Xml).append(text, *map, "a&b");
+    EXPECT_EQ(
+        text.toStdString(),
+        R"(<?xml version="1.0" encoding="UTF-8"?>)"
+        "\n"
+        R"(<NativeDicomModel xml:space="preserve">)"
+        R"(<DicomAttribute tag="00080005" vr="CS" keyword="SpecificCharacterSet"><Value number="1">ISO_IR 192</Value></DicomAttribute>)"
+        R"(<DicomAttribute tag="00081140" vr="SQ" keyword="ReferencedImageSequence"><Item number="1">)"
+        R"(<DicomAttribute tag="00280009" vr="AT" keyword="FrameIncrementPointer"><Value number="1">00181063</Value></DicomAttribute>)"
+        R"(</Item></DicomAttribute>)"
+        R"(<DicomAttribute tag="00090010" vr="LO"><Value number="1">ACME</Value></DicomAttribute>)"
+        R"(<DicomAttribute tag="00090001" vr="OB" privateCreator="ACME"><InlineBinary>YWI=</InlineBinary></DicomAttribute>)"
+        R"(<DicomAttribute tag="00100010" vr="PN" keyword="PatientName"><PersonName number="1"><Alphabetic>)"
+        R"(<FamilyName>Müller</FamilyName><GivenName>J&lt;&amp;&gt;</GivenName></Alphabetic>)"
+        R"(<Ideographic><FamilyName>ü</FamilyName></Ideographic></PersonName></DicomAttribute>)"
+        R"(<DicomAttribute tag="00280010" vr="US" keyword="Rows"><Value number="1">512</Value></DicomAttribute>)"
+        R"(<DicomAttribute tag="00280030" vr="DS" keyword="PixelSpacing"><Value number="1">0.5</Value>)"
+        R"(<Value number="2">0.5</Value></DicomAttribute>)"
+        R"(<DicomAttribute tag="7FE00010" vr="OB" keyword="PixelData"><BulkData uri="a&amp;b/7FE00010"/></DicomAttribute>)"
+        "</NativeDicomModel>\n");
+}
+
+}  // namespace

@@ -1,0 +1,157 @@
+#include "BrowserFixture.h"
+#include "server/browser/ShownValue.h"
+
+#include <libdeflate.h>
+
+using namespace Kdd;
+using namespace Kdd::Browser;
+
+namespace
+{
+
+constexpr const char* kHostile = "<img src=x onerror=alert(1)>\"'&</script>";
+
+DatasetBuilder image(const char* uid)
+{
+    return anImage(uid).inStudy("1.2").inSeries("1.3").with(DCM_PatientName, "Doe^Jane");
+}
+
+QByteArray inflated(const QByteArray& gzip)
+{
+    QByteArray out(1 << 20, '\0');
+    size_t size = 0;
+    libdeflate_decompressor* decompressor = libdeflate_alloc_decompressor();
+    EXPECT_EQ(libdeflate_gzip_decompress(decompressor, gzip.constData(), size_t(gzip.size()), out.data(),
+                                         size_t(out.size()), &size),
+              LIBDEFLATE_SUCCESS);
+    libdeflate_free_decompressor(decompressor);
+    out.truncate(int(size));
+    return out;
+}
+
+struct Refusal
+{
+    const char* target;
+    Http::Method method;
+    int status;
+};
+
+const Refusal kRefusals[] = {
+    {"/nothing", Http::Method::Get, 404},
+    {"/page", Http::Method::Get, 404},
+    {"/page/../style.css", Http::Method::Get, 404},
+    {"/page/Page.cpp", Http::Method::Get, 404},
+    {"/browser", Http::Method::Get, 404},
+    {"/browser/studies", Http::Method::Get, 404},
+    {"/browser/studies/9.9", Http::Method::Get, 404},
+    {"/browser/studies/no-uid", Http::Method::Get, 404},
+    {"/browser/studies/1.2/nothing", Http::Method::Get, 404},
+    {"/browser/studies/1.2/series", Http::Method::Get, 404},
+    {"/browser/studies/1.2/series/9/images", Http::Method::Get, 404},
+    {"/browser/studies/1.2/series/1.3/preview", Http::Method::Get, 404},
+    {"/browser/studies/1.2/series/1.3/volumes/0/preview", Http::Method::Get, 404},
+    {"/browser/studies/1.2/images/1.4", Http::Method::Get, 404},
+    {"/browser/studies/1.2/images/1.4/preview", Http::Method::Get, 404},
+    {"/browser/studies/1.2/images/9/attributes", Http::Method::Get, 404},
+    {"/browser/studies/1.2/difference?a=1.4", Http::Method::Get, 404},
+    {"/browser/studies/1.2/difference?a=1.4&b=9", Http::Method::Get, 404},
+    {"/browser/studies/1.2", Http::Method::Post, 405},
+    {"/browser/studies/1.2", Http::Method::Delete, 405},
+    {"/", Http::Method::Options, 204},
+};
+
+}  // namespace
+
+TEST_F(BrowserTest, RefusesWhatIsNotThereWithAReasonAndSafely)
+{
+    write({image("1.4")});
+    for (const Refusal& refusal : kRefusals) {
+        const Http::Response response = get(refusal.target, {}, refusal.method);
+        EXPECT_EQ(response.status, refusal.status) << refusal.target;
+        EXPECT_EQ(bodyOf(response).isEmpty(), refusal.status != 404) << refusal.target;
+        EXPECT_TRUE(header(response, "Content-Security-Policy").contains("default-src 'none'"))
+            << refusal.target;
+    }
+}
+
+TEST_F(BrowserTest, LetsNothingOfAnAnswerBeTakenForAScript)
+{
+    write({image("1.4")});
+    for (const char* target :
+         {"/", "/page/app.js", "/browser/config", "/browser/studies/1.2", "/browser/studies/1.2/preview",
+          "/browser/studies/1.2/images/1.4/attributes"}) {
+        const Http::Response response = get(target);
+        const QByteArray policy = header(response, "Content-Security-Policy");
+        EXPECT_EQ(response.status, 200) << target;
+        EXPECT_FALSE(policy.contains("unsafe") || policy.contains("*")) << policy.constData();
+        EXPECT_TRUE(policy.contains("frame-ancestors 'none'")) << policy.constData();
+        EXPECT_EQ(header(response, "Referrer-Policy"), "no-referrer") << target;
+    }
+    EXPECT_FALSE(bodyOf(get("/")).contains("<script>") || bodyOf(get("/")).contains("style="));
+}
+
+TEST_F(BrowserTest, GivesHostileValuesAsTextAndAsTheyAre)
+{
+    write({image("1.4").with(DCM_PatientName, kHostile).with(DCM_ImageComments, "a\nb\x1b\x01")});
+    EXPECT_EQ(text(json("/browser/studies/1.2")[QStringLiteral("attributes")].toObject(), "PatientName"),
+              kHostile);
+    const QJsonObject tree = json("/browser/studies/1.2/images/1.4/attributes");
+    EXPECT_EQ(text(entry(tree[QStringLiteral("attributes")], "00100010"), "value"), kHostile);
+    EXPECT_EQ(text(entry(tree[QStringLiteral("attributes")], "00204000"), "value"), "a\nb\x1b\x01");
+    EXPECT_EQ(header(get("/browser/studies/1.2"), "Content-Type"), "application/json");
+}
+
+TEST_F(BrowserTest, NamesAnImageWithoutUIDWithoutTellingItsPath)
+{
+    write({image("1.4").without(DCM_SOPInstanceUID)}, "/secret/place/a.dcm");
+    const QJsonArray images =
+        json("/browser/studies/1.2/series/1.3/images")[QStringLiteral("images")].toArray();
+    ASSERT_EQ(images.size(), 1);
+    const QByteArray key = images[0][QStringLiteral("key")].toString().toLatin1();
+    EXPECT_TRUE(key.startsWith("object-")) << key.constData();
+    const QByteArray attributes = "/browser/studies/1.2/images/" + key + "/attributes";
+    EXPECT_EQ(text(json(attributes), "key"), key.toStdString());
+    for (const QByteArray& target :
+         {attributes, QByteArray("/browser/studies/1.2"), QByteArray("/browser/studies/1.2/sizes")})
+        EXPECT_FALSE(bodyOf(get(target)).contains("secret")) << target.constData();
+}
+
+TEST_F(BrowserTest, OpensAStudyAndASeriesWhoseUIDsAreNone)
+{
+    write({image("1.4").inStudy("05fa-odd").inSeries("a/b")});
+    const QJsonValue series = json("/browser/studies/05fa-odd")[QStringLiteral("series")].toArray()[0];
+    const QByteArray key = series[QStringLiteral("key")].toString().toLatin1();
+    EXPECT_EQ(json("/browser/studies/05fa-odd/series/" + key + "/images")[QStringLiteral("count")].toInt(),
+              1);
+    EXPECT_EQ(get("/browser/studies/" + QByteArray(5000, '1')).status, 404);
+}
+
+TEST_F(BrowserTest, SendsThePageCompressedAndOnlyWhenItIsNew)
+{
+    const Http::Response plain = get("/");
+    const Http::Response compressed = get("/", {{"accept-encoding", "gzip, br"}});
+    EXPECT_EQ(header(plain, "Content-Encoding"), "");
+    EXPECT_EQ(header(compressed, "Content-Encoding"), "gzip");
+    EXPECT_EQ(inflated(bodyOf(compressed)), bodyOf(plain));
+    EXPECT_NE(header(plain, "ETag"), header(compressed, "ETag"));
+    const Http::Response known = get("/", {{"if-none-match", "\"other\", W/" + header(plain, "ETag")}});
+    EXPECT_EQ(known.status, 304);
+    EXPECT_TRUE(bodyOf(known).isEmpty());
+    EXPECT_EQ(get("/", {{"if-none-match", header(compressed, "ETag")}}).status, 200);
+}
+
+TEST_F(BrowserTest, KnowsAgainWhatAClientHasUntilItChanges)
+{
+    write({image("1.4")});
+    const QByteArray etag = header(get("/browser/studies/1.2"), "ETag");
+    EXPECT_EQ(get("/browser/studies/1.2", {{"if-none-match", etag}}).status, 304);
+    write({image("1.4").with(DCM_PatientName, "Roe^Richard")});
+    EXPECT_EQ(get("/browser/studies/1.2", {{"if-none-match", etag}}).status, 200);
+}
+
+TEST_F(BrowserTest, TellsWhatElseTheServerHas)
+{
+    const QJsonObject config = json("/browser/config");
+    EXPECT_EQ(text(config, "dicomWeb"), "pacs/dicom-web");
+    EXPECT_TRUE(config[QStringLiteral("viewer")].toBool());
+}

@@ -1,0 +1,209 @@
+// Walks the study browser in headless Chromium by keyboard, as a reader does: list, study, image, differences, volumes,
+// corrections. A study of the archive bears a name that is markup, and nothing of it may come alive.
+//
+// usage: node page.mjs http://HOST:PORT [FOLDER FOR PICTURES]
+//
+// Modules are looked for in KDD_NODE_MODULES, the browser in CHROMIUM.
+
+import { createRequire } from 'node:module';
+import { mkdirSync } from 'node:fs';
+import { join } from 'node:path';
+
+const [, , root, folder] = process.argv;
+const require = createRequire(`${process.env.KDD_NODE_MODULES}/`);
+const puppeteer = require('puppeteer-core');
+
+const looks = [];
+for (const scheme of ['light', 'dark'])
+  for (const [size, width, height] of [['wide', 1440, 900], ['narrow', 390, 844]]) looks.push({ scheme, size, width, height });
+
+const faults = [];
+let checks = 0;
+
+function check(holds, what) {
+  ++checks;
+  if (!holds) faults.push(what);
+}
+
+const browser = await puppeteer.launch({
+  executablePath: process.env.CHROMIUM ?? '/usr/bin/chromium', args: ['--no-sandbox', '--disable-gpu'],
+});
+const page = await browser.newPage();
+page.setDefaultTimeout(30000);
+page.on('pageerror', (error) => faults.push(`script: ${error.message}`));
+page.on('console', (message) => message.type() === 'error' && faults.push(`console: ${message.text()} ${message.location()?.url ?? ''}`));
+page.on('dialog', (dialog) => { faults.push(`dialog: ${dialog.message()}`); dialog.dismiss(); });
+page.on('request', (request) => request.url().startsWith(root) || request.url().startsWith('data:') || faults.push(`asks ${request.url()}`));
+
+const all = (selector) => page.$$eval(selector, (found) => found.length);
+const text = (selector) => page.$eval(selector, (found) => found.textContent);
+const focused = (selector) => page.evaluate((one) => document.activeElement?.matches(one) ?? false, selector);
+const address = () => page.evaluate(() => decodeURIComponent(location.hash));
+
+/** Until the condition holds in the page; what it waited for is the fault when it never does. */
+async function until(what, condition, ...values) {
+  ++checks;
+  await page.waitForFunction(condition, {}, ...values).catch(() => faults.push(`waited in vain: ${what}`));
+}
+
+const present = (selector) => until(selector, (one) => document.querySelector(one) !== null, selector);
+
+/** Pictures in sight have come, or it is known that there are none. */
+async function settled() {
+  await until('pictures', () => [...document.querySelectorAll('img')].every((one) => {
+    const place = one.getBoundingClientRect();
+    const isSeen = place.width > 0 && place.bottom > 0 && place.top < innerHeight && place.right > 0 && place.left < innerWidth;
+    return !isSeen || one.complete;
+  }) && !document.querySelector('[aria-busy=true]'));
+}
+
+async function shoot(name) {
+  if (!folder) return;
+  mkdirSync(folder, { recursive: true });
+  for (const { scheme, size, width, height } of looks) {
+    await page.emulateMediaFeatures([{ name: 'prefers-color-scheme', value: scheme }]);
+    await page.setViewport({ width, height });
+    await settled();
+    const overflow = await page.evaluate(() => document.documentElement.scrollWidth - innerWidth);
+    check(overflow <= 0, `${name}, ${size}: the page is ${overflow} pixels wider than the window`);
+    await page.screenshot({ path: join(folder, `${name}-${size}-${scheme}.png`) });
+  }
+  await page.emulateMediaFeatures([]);
+  await page.setViewport({ width: 1440, height: 900 });
+}
+
+async function search(name) {
+  await page.keyboard.press('/');
+  check(await focused('#by-name'), '"/" does not lead to the search');
+  await page.keyboard.type(name);
+  await until(`a list of ${name}`, (part) => {
+    const rows = [...document.querySelectorAll('.study .first')];
+    return rows.length > 0 && rows.every((row) => row.textContent.toLowerCase().includes(part));
+  }, name.toLowerCase());
+}
+
+async function walkList() {
+  await page.goto(`${root}/`);
+  await present('.study');
+  const whole = await all('.study');
+  await settled();
+  await shoot('list');
+  await search('<img');
+  check((await text('.study .first')).startsWith('<img src'), 'the name that is markup is not shown as text');
+  check((await text('.study .what')).includes('<script>'), 'the description that is markup is not shown as text');
+  await page.keyboard.press('Escape');
+  await until('the whole list', (count) => document.querySelectorAll('.study').length === count, whole);
+  await page.keyboard.press('ArrowDown');
+  check(await focused('.study'), 'an arrow does not lead into the list');
+  await page.keyboard.press('End');
+  check(await page.evaluate(() => document.activeElement === [...document.querySelectorAll('.study')].pop()), 'End does not lead to the last study');
+}
+
+async function openStudy(query) {
+  await page.goto(`${root}/#/?${query}`);
+  await until(`one study of ${query}`, () => document.querySelectorAll('.study').length === 1);
+  await page.keyboard.press('ArrowDown');
+  await page.keyboard.press('Enter');
+  await present('.strip .tile[href]');
+}
+
+async function walkStudy() {
+  await openStudy('name=ller&modality=CT');
+  check((await address()).startsWith('#/studies/'), 'Enter does not open the study');
+  await present('.sizes');
+  await shoot('study');
+  await page.keyboard.press('ArrowDown');
+  check(await focused('.strip .tile'), 'an arrow does not lead into the strip');
+  await present('.series:nth-child(2) .tile[tabindex="0"]');
+  await page.keyboard.press('ArrowDown');
+  check(await focused('.series:nth-child(2) .tile'), 'an arrow does not lead to the next strip');
+  for (let i = 0; i < 3; ++i) await page.keyboard.press('ArrowRight');
+  await page.keyboard.press('Enter');
+  await present('.attribute');
+}
+
+async function walkImage() {
+  const first = await address();
+  const rows = await all('.attribute');
+  check(rows > 30, `only ${rows} attributes are shown`);
+  for (const origin of ['study', 'series', 'image']) check(await all(`.attribute .origin.of-${origin}`) > 0, `nothing is held by the ${origin}`);
+  await shoot('image');
+  await page.keyboard.press('/');
+  await page.keyboard.type('patient name');
+  await until('the filtered tree', () => document.querySelectorAll('.attribute').length < 5);
+  check((await text('.attribute .text')).includes('ller'), 'the filter does not find the patient');
+  await page.keyboard.press('Escape');
+  await page.keyboard.press('Escape');
+  await page.keyboard.press('ArrowDown');
+  check(await focused('.attribute'), 'an arrow does not lead into the tree');
+  await page.$eval('.attribute[aria-expanded=false]', (row) => row.focus());
+  await page.keyboard.press('ArrowRight');
+  check(await page.$eval('.attribute:focus', (row) => row.getAttribute('aria-expanded')) === 'true', 'a sequence does not open');
+  await page.keyboard.press('ArrowLeft');
+  await page.keyboard.press('n');
+  await until('the next image', (former) => decodeURIComponent(location.hash) !== former, first);
+  await page.goBack();
+  await until('the image before', (former) => decodeURIComponent(location.hash) === former, first);
+  await page.reload();
+  await present('.attribute');
+  check(await address() === first, 'a reload leads elsewhere');
+}
+
+async function walkSides() {
+  await page.$eval('.aside .button[href*=difference]', (link) => link.focus());
+  await page.keyboard.press('Enter');
+  await present('.difference .b');
+  check(await all('.difference mark') > 0, 'no difference is marked');
+  await shoot('difference');
+  await page.keyboard.press('Escape');
+  await present('.tabs');
+  await page.$eval('.tabs a[href$=volumes]', (link) => link.focus());
+  await page.keyboard.press('Enter');
+  await present('.volume .geometry');
+  await shoot('volumes');
+}
+
+async function walkHostile() {
+  await openStudy('name=%3Cimg');
+  await page.$eval('.tabs a[href$=corrections]', (link) => link.focus());
+  await page.keyboard.press('Enter');
+  await present('.correction');
+  await shoot('corrections');
+  check(await page.evaluate(() => window.owned === undefined && !document.querySelector('img[src=x], main script')), 'markup of a value came alive');
+  await page.goto(`${root}/#/studies/1.2.3.4.5.6.7.8.9`);
+  await until('words for a study that is not there', () => document.querySelector('.state')?.textContent.includes('no such study'));
+}
+
+async function walkOffline() {
+  await page.goto(`${root}/#/`);
+  await present('.study');
+  await page.setOfflineMode(true);
+  await until('word of the lost connection', () => !document.getElementById('offline').hidden);
+  await page.keyboard.press('ArrowDown');
+  await page.keyboard.press('Enter');
+  await until('words for a server that is out of reach', () => document.querySelector('.state')?.textContent.includes('cannot be reached'));
+  await page.setOfflineMode(false);
+  await present('.banner');
+}
+
+/** What Chromium says of an answer that the walk expects to fail is no fault of the page. */
+function isExpected(fault) {
+  return fault.startsWith('console: Failed to load resource') &&
+    (fault.includes('/browser/studies/1.2.3.4.5.6.7.8.9') || fault.includes('ERR_INTERNET_DISCONNECTED'));
+}
+
+try {
+  await walkList();
+  await walkStudy();
+  await walkImage();
+  await walkSides();
+  await walkHostile();
+  await walkOffline();
+} catch (error) {
+  faults.push(String(error));
+}
+await browser.close();
+const found = faults.filter((fault) => !isExpected(fault));
+for (const fault of found) console.error(fault);
+console.log(`${checks} checks, ${found.length} faults`);
+process.exitCode = found.length > 0 ? 1 : 0;

@@ -1,0 +1,47 @@
+#!/usr/bin/env bash
+# Serves a synthetic archive, in which one patient's name is markup, and has page.mjs walk the study browser.
+#
+# usage: page.sh KDD [FOLDER FOR PICTURES]
+#
+# Needs node, Chromium and a folder of node modules with puppeteer-core, named by KDD_NODE_MODULES; 77 says that one of
+# them is missing.
+set -euo pipefail
+kdd=$1
+pictures=${2:-}
+here=$(cd "$(dirname "$0")" && pwd)
+
+skip() {
+    echo "Skipped: $1"
+    exit 77
+}
+command -v node >/dev/null || skip "there is no node"
+[ -x "${CHROMIUM:-/usr/bin/chromium}" ] || skip "there is no Chromium"
+[ -d "${KDD_NODE_MODULES:-}/puppeteer-core" ] || skip "KDD_NODE_MODULES names no folder with puppeteer-core"
+
+folder=$(mktemp -d)
+server=
+cleanup() {
+    [ -z "$server" ] || kill "$server" 2>/dev/null || true
+    [ -z "$server" ] || wait "$server" 2>/dev/null || true
+    rm -rf "$folder"
+}
+trap cleanup EXIT
+
+export KDD_STORE=$folder/store
+"$kdd" --quiet sample "$folder/day" --images 400
+"$kdd" --quiet add "$folder/day" >/dev/null
+study=$("$kdd" list | awk '/ OT / {print $1; exit}')
+image=$("$kdd" --json show "$study" --tree | grep -o '"image": *"[0-9.]*"' | head -n 1 | grep -o '[0-9.]*')
+cat >"$folder/job.xml" <<'XML'
+<Job><Timestamp>20240601093000</Timestamp><Login>anna</Login><Substitutions>
+<Tag Group="0010" Element="0010"><Value>&lt;img src=x onerror=window.owned=1&gt;</Value></Tag>
+<Tag Group="0008" Element="1030"><Value>&lt;script&gt;window.owned=1&lt;/script&gt;</Value></Tag>
+</Substitutions></Job>
+XML
+"$kdd" --quiet qa "$folder/job.xml" --study "$study" --image "$image"
+
+mkfifo "$folder/said"
+"$kdd" serve --listen 127.0.0.1:0 >"$folder/said" &
+server=$!
+read -r said <"$folder/said"
+node "$here/page.mjs" "${said##* }" "$pictures"

@@ -1,0 +1,386 @@
+#include "server/dicomweb/metadata/MetadataResource.h"
+#include "support/DatasetBuilder.h"
+#include "support/FileContent.h"
+#include "support/LogCapture.h"
+#include "support/RealFiles.h"
+#include "support/Setting.h"
+#include "support/TemporaryStore.h"
+
+#include <QDir>
+#include <QDirIterator>
+#include <QFile>
+#include <QJsonArray>
+#include <QJsonDocument>
+#include <QJsonObject>
+#include <QUrl>
+#include <QXmlStreamReader>
+
+#include <fcntl.h>
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <kddlib/DicomJson.h>
+#include <kddlib/QAData.h>
+#include <kddlib/TagMap.h>
+#include <sys/stat.h>
+#include <zlib.h>
+
+#include <functional>
+#include <sstream>
+
+using namespace Kdd;
+using namespace Kdd::DicomWeb;
+
+namespace
+{
+
+QByteArray unpacked(const QByteArray& gzip)
+{
+    z_stream stream = {};
+    EXPECT_EQ(inflateInit2(&stream, 15 + 16), Z_OK);
+    QByteArray out(100 * gzip.size() + 65536, Qt::Uninitialized);
+    stream.next_in = reinterpret_cast<z_const Bytef*>(const_cast<char*>(gzip.constData()));
+    stream.avail_in = static_cast<uInt>(gzip.size());
+    stream.next_out = reinterpret_cast<Bytef*>(out.data());
+    stream.avail_out = static_cast<uInt>(out.size());
+    EXPECT_EQ(inflate(&stream, Z_FINISH), Z_STREAM_END);
+    out.resize(static_cast<int>(stream.total_out));
+    inflateEnd(&stream);
+    return out;
+}
+
+/// An answer as a client has it.
+struct Received
+{
+    int status = 0;
+    QByteArray body;
+    bool wasKept = false;
+    QMap<QByteArray, QByteArray> headers;
+
+    QByteArray tag() const { return headers.value("ETag"); }
+};
+
+using Headers = QVector<Http::Field>;
+const Headers kGzip = {{"accept-encoding", "gzip, br"}};
+
+class MetadataTest : public testing::Test
+{
+protected:
+    /// Study 1.2 with two series of `count` images each.
+    static void write(int count = 6)
+    {
+        TagFile file;
+        for (int i = 0; i < 2 * count; ++i) {
+            DatasetBuilder image = anImage(("1." + QByteArray::number(i + 1)).constData());
+            image.inSeries(i < count ? "1.2.3" : "1.2.4").with(DCM_SpecificCharacterSet, "ISO_IR 100");
+            image.with(DCM_PatientName, "M\xfcller")
+                .with(DCM_InstanceNumber, QByteArray::number(i).constData());
+            image.withLong(DCM_PatientComments, 3000);
+            file.addTagMap(image.map(), nullptr, true);
+        }
+        file.optimizeAll();
+        EXPECT_TRUE(file.writeCacheFile());
+    }
+
+    Received get(const char* address, const Headers& headers = {})
+    {
+        const QUrl url(QStringLiteral("/studies/") + QString::fromLatin1(address));
+        Http::Request request;
+        request.headers = headers;
+        for (const QByteArray& segment : url.path().mid(1).toLatin1().split('/'))
+            request.path.append(segment);
+        for (const QByteArray& each : url.query().toLatin1().split('&'))
+            if (!each.isEmpty())
+                request.query.append({each.left(each.indexOf('=')), each.mid(each.indexOf('=') + 1)});
+        ResourcePath path;
+        EXPECT_TRUE(ResourcePath::parse(request.path, path));
+        EXPECT_TRUE(mResource.owns(path));
+        return received(mResource.answer(request, path));
+    }
+
+    static Received received(Http::Response response)
+    {
+        Received received;
+        received.status = response.status;
+        for (const Http::Field& header : response.headers)
+            received.headers.insert(header.name, header.value);
+        for (Http::BodyPart& part : response.body) {
+            if (const auto* bytes = std::get_if<QByteArray>(&part))
+                received.body += *bytes;
+            if (const auto* range = std::get_if<Http::FileRange>(&part)) {
+                received.wasKept = true;
+                EXPECT_TRUE(range->file->read(range->offset, range->length, received.body).good());
+            }
+            QByteArray block;
+            if (auto* producer = std::get_if<std::unique_ptr<Http::Producer>>(&part))
+                while ((*producer)->next(block).good() && !block.isEmpty())
+                    received.body += block;
+        }
+        return received;
+    }
+
+    /// What the images are by the library's function for one image.
+    static QByteArray expected(const std::function<QByteArray(const TagMap& image)>& rootOf,
+                               const char* series = "")
+    {
+        TagFile file;
+        EXPECT_TRUE(file.readCacheFileForStudy("1.2", false));
+        std::ostringstream out;
+        const char* separator = "[";
+        for (const TagMap* each : file.study()->children()) {
+            for (const TagMap* image : each->children()) {
+                if (*series != '\0' && each->uid(TagMap::SeriesLevel) != series)
+                    continue;
+                out << separator;
+                writeDicomJson(out, *image, rootOf(*image).toStdString());
+                separator = ",";
+            }
+        }
+        return QByteArray::fromStdString(out.str() + "]");
+    }
+
+    QStringList keptFiles() const
+    {
+        QStringList files;
+        QDirIterator all(mStore.filePath("answers"), QDir::Files, QDirIterator::Subdirectories);
+        while (all.hasNext())
+            files.append(all.next());
+        return files;
+    }
+
+    TemporaryStore mStore;
+    Setting mPatience{"KDD_READ_PATIENCE", "0"};
+    StudyShelf mShelf{1 << 30};
+    MetadataResource mResource{mShelf, mStore.filePath("answers"), 1 << 20};
+};
+
+TEST_F(MetadataTest, IsThatOfEachImageWithAddressesThatLeadToItsBulkData)
+{
+    write();
+    const auto below = [](const TagMap& image) {
+        return "instances/" + image.uid(TagMap::ImageLevel) + "/bulkdata";
+    };
+    const auto ofStudy = [&](const TagMap& image) {
+        return "series/" + image.uid(TagMap::SeriesLevel) + '/' + below(image);
+    };
+    EXPECT_EQ(get("1.2/metadata").body, expected(ofStudy));
+    EXPECT_EQ(get("1.2/series/1.2.4/metadata").body, expected(below, "1.2.4"));
+    const char* const addresses[] = {"1.2/metadata", "1.2/series/1.2.3/metadata",
+                                     "1.2/series/1.2.3/instances/1.1/metadata"};
+    for (const char* address : addresses) {
+        const Received received = get(address);
+        EXPECT_EQ(received.headers.value("Content-Type"), "application/dicom+json");
+        const QJsonArray images = QJsonDocument::fromJson(received.body).array();
+        const QString uri = images.at(0)
+                                .toObject()[QStringLiteral("00104000")]
+                                .toObject()[QStringLiteral("BulkDataURI")]
+                                .toString();
+        const QUrl base(QStringLiteral("http://h/dicom-web/studies/") + QLatin1String(address));
+        EXPECT_EQ(base.resolved(QUrl(uri)).path().toStdString(),
+                  "/dicom-web/studies/1.2/series/1.2.3/instances/1.1/bulkdata/00104000");
+    }
+}
+
+TEST_F(MetadataTest, IsGivenInTheFormThatIsAskedFor)
+{
+    write(1);
+    const struct
+    {
+        const char* accept;
+        int status;
+        const char* type;
+    } rows[] = {
+        {"*/*", 200, "application/dicom+json"},
+        {"application/json", 200, "application/json"},
+        {"application/dicom+json;q=0.1, application/json", 200, "application/json"},
+        {"multipart/related; type=\"application/dicom+xml\"", 200, "multipart/related"},
+        {"multipart/related; type=application/dicom+xml", 200, "multipart/related"},
+        {"text/html", 406, "text/plain; charset=utf-8"},
+        {"multipart/related; type=\"application/octet-stream\"", 406, "text/plain; charset=utf-8"},
+    };
+    for (const auto& row : rows) {
+        const Received received = get("1.2/metadata", {{"accept", row.accept}});
+        EXPECT_EQ(received.status, row.status) << row.accept;
+        EXPECT_EQ(received.headers.value("Content-Type").left(static_cast<int>(strlen(row.type))), row.type);
+    }
+    const Received xml =
+        get("1.2/metadata", {{"accept", "multipart/related; type=\"application/dicom+xml\""}});
+    const QByteArray type = xml.headers.value("Content-Type");
+    const QByteArray boundary = "--" + type.mid(type.indexOf("boundary=") + 9);
+    EXPECT_EQ(xml.body.count(boundary + "\r\nContent-Type: application/dicom+xml\r\n\r\n<?xml"), 2);
+    EXPECT_TRUE(xml.body.endsWith("\r\n" + boundary + "--\r\n"));
+    const int begin = xml.body.indexOf("<?xml");
+    QXmlStreamReader reader(xml.body.mid(begin, xml.body.indexOf("\r\n--", begin) - begin));
+    while (!reader.atEnd())
+        reader.readNext();
+    EXPECT_FALSE(reader.hasError()) << qPrintable(reader.errorString());
+}
+
+TEST_F(MetadataTest, HoldsOnlyTheFieldsThatAreNamed)
+{
+    write(1);
+    const struct
+    {
+        const char* query;
+        int attributes;  // -1: refused
+    } rows[] = {
+        {"includefield=PatientName", 5},
+        {"includefield=00100010,InstanceNumber&includefield=00080016", 7},
+        {"includefield=PatientName&includefield=all", 11},
+        {"includefield=", -1},
+        {"includefield=NoSuchName", -1},
+        {"includefield=../x", -1},
+    };
+    for (const auto& row : rows) {
+        const Received received = get((QByteArray("1.2/series/1.2.3/metadata?") + row.query).constData());
+        EXPECT_EQ(received.status, row.attributes < 0 ? 400 : 200) << row.query;
+        const int attributes = QJsonDocument::fromJson(received.body).array().at(0).toObject().size();
+        EXPECT_EQ(attributes, qMax(0, row.attributes)) << row.query;
+    }
+}
+
+TEST_F(MetadataTest, SaysWhatIsNotThere)
+{
+    const LogCapture log;
+    EXPECT_EQ(get("1.2/metadata").status, 404);
+    write();
+    EXPECT_EQ(get("1.2/series/1.9/metadata").status, 404);
+    EXPECT_EQ(get("1.2/series/1.2.4/instances/1.1/metadata").status, 404) << "it is in the other series";
+    EXPECT_EQ(get("1.2/series/1.9/metadata", {{"if-none-match", "*"}}).status, 404);
+    {
+        TagFile holder;
+        ASSERT_TRUE(holder.readCacheFileForStudy("1.2", true));
+        const Received held = get("1.2/metadata");
+        EXPECT_EQ(held.status, 503);
+        EXPECT_EQ(held.headers.value("Retry-After"), "2");
+    }
+    putFile(TagFile::cacheFilePathForStudy("1.2"), "no tag file");
+    const Received damaged = get("1.2/metadata");
+    EXPECT_EQ(damaged.status, 500);
+    EXPECT_FALSE(damaged.body.contains(".tc")) << "no names of files";
+}
+
+TEST_F(MetadataTest, IsKeptCompressedAndTheSameEachTime)
+{
+    write();
+    const QByteArray plain = get("1.2/metadata").body;
+    const Received first = get("1.2/metadata", kGzip);
+    const Received second = get("1.2/metadata", kGzip);
+    EXPECT_FALSE(first.wasKept);
+    EXPECT_TRUE(second.wasKept);
+    EXPECT_EQ(first.headers.value("Content-Encoding"), "gzip");
+    EXPECT_EQ(first.headers, second.headers);
+    EXPECT_EQ(first.body, second.body);
+    EXPECT_EQ(unpacked(first.body), plain);
+    EXPECT_NE(first.tag(), get("1.2/metadata").tag()) << "compressed bytes are other bytes";
+    EXPECT_EQ(unpacked(get("1.2/series/1.2.3/instances/1.1/metadata", kGzip).body),
+              get("1.2/series/1.2.3/instances/1.1/metadata").body);
+    EXPECT_FALSE(get("1.2/metadata?includefield=PatientName", kGzip).wasKept);
+    EXPECT_EQ(keptFiles().size(), 2);
+}
+
+TEST_F(MetadataTest, IsNotSentAgainToWhoeverHasIt)
+{
+    write();
+    const Received first = get("1.2/metadata");
+    for (const QByteArray& held :
+         {first.tag(), "\"x\", " + first.tag(), "W/" + first.tag(), QByteArray("*")}) {
+        const Received again = get("1.2/metadata", {{"if-none-match", held}});
+        EXPECT_EQ(again.status, 304) << held.constData();
+        EXPECT_EQ(again.tag(), first.tag());
+        EXPECT_TRUE(again.body.isEmpty());
+    }
+    EXPECT_EQ(get("1.2/series/1.2.3/metadata", {{"if-none-match", first.tag()}}).status, 200);
+    EXPECT_EQ(get("1.2/metadata?includefield=PatientName", {{"if-none-match", first.tag()}}).status, 200);
+}
+
+void correct()
+{
+    QAData job;
+    job.studyUID = "1.2";
+    job.images = {"1.1"};
+    job.timestamp = "20240131120000";
+    job.substitutions = {{DCM_PatientName, QStringLiteral("New")}};
+    QString message;
+    ASSERT_TRUE(TagFile::applyQA(job, message)) << qPrintable(message);
+}
+
+void merge()
+{
+    TagFile file;
+    file.addTagMap(anImage("1.1").inSeries("1.2.3").with(DCM_PatientName, "New").map(), nullptr, true);
+    ASSERT_TRUE(file.mergeIntoCacheFile());
+}
+
+void sync()
+{
+    TagFile file;
+    ASSERT_TRUE(file.readCacheFileForStudy("1.2", true));
+    file.findImage("1.1")->putAndInsertString(DCM_PatientName, "New");
+    file.createAbstractTags();
+    ASSERT_TRUE(file.writeCacheFile());
+}
+
+TEST_F(MetadataTest, ShowsEveryChangeAtOnceAlsoWhereItIsKept)
+{
+    for (void (*change)() : {correct, merge, sync}) {
+        write();
+        get("1.2/metadata", kGzip);
+        const Received before = get("1.2/metadata", kGzip);
+        ASSERT_TRUE(before.wasKept);
+        change();
+        const Received after = get("1.2/metadata", {kGzip.first(), {"if-none-match", before.tag()}});
+        EXPECT_EQ(after.status, 200);
+        EXPECT_FALSE(after.wasKept);
+        EXPECT_NE(after.tag(), before.tag());
+        EXPECT_TRUE(unpacked(after.body).contains("New"));
+        EXPECT_FALSE(unpacked(before.body).contains("New"));
+    }
+}
+
+TEST_F(MetadataTest, KeepsNothingOfAnAnswerThatIsNotTakenToItsEnd)
+{
+    write();
+    Http::Request request;
+    request.headers = kGzip;
+    ResourcePath path;
+    path.study = "1.2";
+    path.resource = "metadata";
+    {
+        Http::Response response = mResource.answer(request, path);
+        QByteArray block;
+        ASSERT_TRUE(std::get<std::unique_ptr<Http::Producer>>(response.body.front())->next(block).good());
+    }
+    EXPECT_TRUE(keptFiles().isEmpty());
+    EXPECT_FALSE(get("1.2/metadata", kGzip).wasKept);
+}
+
+TEST(KeptAnswers, LetsGoOfThoseThatWereNotUsedTheLongest)
+{
+    const TemporaryStore store;
+    KeptAnswers answers(store.filePath("kept"), 1000);
+    Http::FileRange range;
+    const auto keep = [&](const QByteArray& name) {
+        const auto draft = answers.begin(name);
+        draft->write(QByteArray(300, name.at(0)));
+        EXPECT_FALSE(answers.find(name, range)) << "not before it is whole";
+        draft->keep();
+        // Long ago, in the order of the names.
+        const QByteArray file = store.filePath("kept").toLocal8Bit() + '/' + name.left(2) + '/' + name;
+        const timespec times[] = {{1000 + name.at(0), 0}, {1000 + name.at(0), 0}};
+        ::utimensat(AT_FDCWD, file.constData(), times, 0);
+    };
+    keep("aa1");
+    keep("bb1");
+    keep("cc1");
+    EXPECT_TRUE(answers.find("aa1", range)) << "used now";
+    const Http::FileRange held = range;
+    keep("dd1");
+    EXPECT_FALSE(answers.find("bb1", range));
+    EXPECT_TRUE(answers.find("aa1", range) && answers.find("cc1", range) && answers.find("dd1", range));
+    QByteArray bytes;
+    EXPECT_TRUE(held.file->read(held.offset, held.length, bytes).good());
+    EXPECT_EQ(bytes, QByteArray(300, 'a'));
+    EXPECT_EQ(KeptAnswers(store.filePath("none"), 0).begin("aa2"), nullptr);
+}
+
+}  // namespace

@@ -1,0 +1,137 @@
+#include "server/http/Client.h"
+
+#include <QProcess>
+
+#include <arpa/inet.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <stdexcept>
+
+namespace Kdd
+{
+
+TlsFiles::TlsFiles()
+{
+    QProcess openssl;
+    openssl.setWorkingDirectory(folder.path());
+    openssl.start(QStringLiteral("openssl"),
+                  QStringLiteral("req -x509 -newkey ec -pkeyopt ec_paramgen_curve:prime256v1 -nodes -subj "
+                                 "/CN=localhost -keyout key.pem -out tls.pem")
+                      .split(QLatin1Char(' ')));
+    openssl.waitForFinished();
+    if (openssl.exitCode() != 0)
+        throw std::runtime_error("openssl makes no certificate");
+}
+
+QByteArray Reply::header(const char* name) const
+{
+    const int at = head.indexOf(QByteArray("\r\n") + name + ": ");
+    const int start = at + static_cast<int>(qstrlen(name)) + 4;
+    return at < 0 ? QByteArray() : head.mid(start, head.indexOf("\r\n", start) - start);
+}
+
+Client::Client(const QByteArray& address, Tls tls, int window)
+    : mSocket(::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0))
+{
+    sockaddr_in there = {};
+    there.sin_family = AF_INET;
+    there.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    there.sin_port = htons(address.mid(address.lastIndexOf(':') + 1).toUShort());
+    const timeval patience = {60, 0};
+    ::setsockopt(mSocket, SOL_SOCKET, SO_RCVTIMEO, &patience, sizeof patience);
+    ::setsockopt(mSocket, SOL_SOCKET, SO_SNDTIMEO, &patience, sizeof patience);
+    if (window > 0)
+        ::setsockopt(mSocket, SOL_SOCKET, SO_RCVBUF, &window, sizeof window);
+    mIsConnected = ::connect(mSocket, reinterpret_cast<sockaddr*>(&there), sizeof there) == 0;
+    if (tls == Tls::No)
+        return;
+    mContext.reset(SSL_CTX_new(TLS_client_method()));
+    mTls.reset(SSL_new(mContext.get()));
+    SSL_set_fd(mTls.get(), mSocket);
+    mIsConnected = SSL_connect(mTls.get()) == 1;
+}
+
+Client::~Client()
+{
+    ::close(mSocket);
+}
+
+void Client::send(const QByteArray& bytes) const
+{
+    // A server that refuses a request may be gone before all of it is sent.
+    if (mTls != nullptr)
+        SSL_write(mTls.get(), bytes.constData(), bytes.size());
+    else
+        (void)!::send(mSocket, bytes.constData(), static_cast<std::size_t>(bytes.size()), MSG_NOSIGNAL);
+}
+
+bool Client::receiveMore()
+{
+    char part[65536];
+    const auto count = mTls != nullptr ? SSL_read(mTls.get(), part, sizeof part)
+                                       : static_cast<int>(::recv(mSocket, part, sizeof part, 0));
+    if (count > 0)
+        mUnread.append(part, count);
+    return count > 0;
+}
+
+bool Client::receiveUntil(const QByteArray& end)
+{
+    while (!mUnread.contains(end))
+        if (!receiveMore())
+            return false;
+    return true;
+}
+
+QByteArray Client::take(qint64 size)
+{
+    while (mUnread.size() < size && receiveMore()) {
+    }
+    const QByteArray taken = mUnread.left(static_cast<int>(size));
+    mUnread.remove(0, static_cast<int>(size));
+    return taken;
+}
+
+void Client::receiveChunks(Reply& reply)
+{
+    while (receiveUntil("\r\n")) {
+        const qint64 size = take(mUnread.indexOf("\r\n") + 2).trimmed().toLongLong(nullptr, 16);
+        const QByteArray chunk = take(size + 2);
+        reply.isWhole = size == 0 && chunk == "\r\n";
+        if (size == 0 || chunk.size() < size + 2)
+            return;
+        reply.body += chunk.left(static_cast<int>(size));
+    }
+}
+
+Reply Client::reply(Body body)
+{
+    Reply reply;
+    if (!receiveUntil("\r\n\r\n"))
+        return reply;
+    reply.head = take(mUnread.indexOf("\r\n\r\n") + 4);
+    reply.status = reply.head.mid(9, 3).toInt();
+    const QByteArray length = reply.header("Content-Length");
+    if (body == Body::StaysBehind || reply.status == 204 || reply.status == 304) {
+        reply.isWhole = true;
+    } else if (reply.header("Transfer-Encoding") == "chunked") {
+        receiveChunks(reply);
+    } else if (!length.isEmpty()) {
+        reply.body = take(length.toLongLong());
+        reply.isWhole = reply.body.size() == length.toLongLong();
+    } else {
+        reply.body = rest();
+        reply.isWhole = true;
+    }
+    return reply;
+}
+
+QByteArray Client::rest()
+{
+    while (receiveMore()) {
+    }
+    return take(mUnread.size());
+}
+
+}  // namespace Kdd

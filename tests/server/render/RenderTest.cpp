@@ -1,0 +1,214 @@
+#include "server/dicomweb/render/RenderedResource.h"
+#include "server/dicomweb/render/ThumbnailResource.h"
+#include "support/DatasetBuilder.h"
+#include "support/LogCapture.h"
+#include "support/TemporaryStore.h"
+
+#include <QBuffer>
+#include <QFile>
+#include <QImage>
+
+#include <gtest/gtest.h>
+#include <kddlib/OwnAttributes.h>
+#include <kddlib/TagFileGenerator.h>
+#include <kddlib/TagMap.h>
+
+using namespace Kdd;
+using namespace Kdd::DicomWeb;
+
+namespace
+{
+
+constexpr int kSide = 8;
+constexpr int kFrames = 3;
+constexpr const char* kPath = "studies/1.2/series/1.3/instances/1.4/";
+
+/// In each frame the values go up by one from pixel to pixel, from the frame's number times 100 on.
+DatasetBuilder aGreyImage()
+{
+    std::vector<Uint16> pixels;
+    for (int frame = 0; frame < kFrames; ++frame)
+        for (int i = 0; i < kSide * kSide; ++i)
+            pixels.push_back(static_cast<Uint16>(frame * 100 + i));
+    DatasetBuilder image = anImage("1.4").inStudy("1.2").inSeries("1.3");
+    image.with(DCM_Rows, "8").with(DCM_Columns, "8").with(DCM_BitsAllocated, "16").with(DCM_BitsStored, "16");
+    image.with(DCM_HighBit, "15").with(DCM_PixelRepresentation, "0").with(DCM_SamplesPerPixel, "1");
+    image.with(DCM_PhotometricInterpretation, "MONOCHROME2").with(DCM_NumberOfFrames, "3");
+    image.dataset().putAndInsertUint16Array(DCM_PixelData, pixels.data(), pixels.size());
+    return image;
+}
+
+class RenderTest : public testing::Test
+{
+protected:
+    void SetUp() override { store(aGreyImage()); }
+
+    /// Writes the file and the tag file of the study; what the tag file says of the image may be another than what its
+    /// file says.
+    void store(const DatasetBuilder& image, const char* windowCenter = nullptr,
+               const QByteArray& preview = {})
+    {
+        mFile = QFile::encodeName(mStore.filePath("image.dcm"));
+        DcmFileFormat file(&image.dataset());
+        ASSERT_TRUE(file.saveFile(mFile.constData(), EXS_LittleEndianExplicit).good());
+        std::unique_ptr<TagMap> map(image.map());
+        if (windowCenter != nullptr)
+            map->putAndInsertValue(DCM_WindowCenter, VrCode::DS, windowCenter);
+        if (!preview.isEmpty())
+            map->putAndInsertValue(kPreview, VrCode::OB, preview);
+        TagFile tags;
+        ASSERT_NE(TagFileGenerator::place(tags, std::move(map), mFile), nullptr);
+        ASSERT_TRUE(tags.writeCacheFile());
+    }
+
+    Http::Response ask(const QByteArray& what, QVector<Http::Field> query = {},
+                       const char* accept = "image/png")
+    {
+        Http::Request request;
+        request.query = std::move(query);
+        request.headers = {{"accept", accept}};
+        ResourcePath path;
+        EXPECT_TRUE(ResourcePath::parse(
+            (what.startsWith("studies") ? what : kPath + what).split('/').toVector(), path));
+        return mRendered.owns(path) ? mRendered.answer(request, path) : mThumbnail.answer(request, path);
+    }
+
+    static QByteArray body(const Http::Response& response)
+    {
+        return response.body.empty() ? QByteArray() : std::get<QByteArray>(response.body.front());
+    }
+
+    QImage picture(const QByteArray& what, QVector<Http::Field> query = {})
+    {
+        const Http::Response response = ask(what, std::move(query));
+        EXPECT_EQ(response.status, 200) << what.constData() << ": " << body(response).constData();
+        return QImage::fromData(body(response));
+    }
+
+    TemporaryStore mStore;
+    LogCapture mLog;
+    StudyShelf mShelf{1 << 30, std::chrono::nanoseconds(-1'000'000'000)};
+    RenderedResource mRendered{mShelf};
+    ThumbnailResource mThumbnail{mShelf};
+    QByteArray mFile;
+};
+
+TEST_F(RenderTest, ShowsValuesByTheWindowThatIsAskedFor)
+{
+    const struct
+    {
+        const char* window;
+        int pixel;  // and its value
+        int level;
+    } cases[] = {
+        {"32,32,linear-exact", 16, 0},
+        {"32,32,linear-exact", 32, 127},
+        {"32,32,linear-exact", 48, 255},
+        {"32,32,linear-exact", 40, 191},
+        {"32,32", 40, 197},
+        {"32,16,sigmoid", 32, 127},
+        {"32,16,sigmoid", 36, 186},
+        {"32,16,sigmoid", 28, 68},
+        {"1000,10,linear", 63, 0},
+    };
+    for (const auto& each : cases) {
+        const QImage shown = picture("frames/1/rendered", {{"window", each.window}});
+        EXPECT_NEAR(qRed(shown.pixel(each.pixel % kSide, each.pixel / kSide)), each.level, 1)
+            << each.window << " of " << each.pixel;
+    }
+}
+
+TEST_F(RenderTest, FollowsACorrectedWindow)
+{
+    store(aGreyImage().with(DCM_WindowCenter, "32").with(DCM_WindowWidth, "32"));
+    const int before = qRed(picture("frames/1/rendered").pixel(0, 4));
+    store(aGreyImage().with(DCM_WindowCenter, "32").with(DCM_WindowWidth, "32"), "24");
+    EXPECT_GT(qRed(picture("frames/1/rendered").pixel(0, 4)), before + 50);
+}
+
+TEST_F(RenderTest, GivesTheFramesThatAreAskedFor)
+{
+    const QVector<Http::Field> window = {{"window", "150,300,linear-exact"}};
+    const int first = qRed(picture("frames/1/rendered", window).pixel(0, 0));
+    const int last = qRed(picture("frames/3/rendered", window).pixel(0, 0));
+    EXPECT_NEAR(last - first, 170, 2);
+
+    Http::Response parts = ask("rendered", window, "multipart/related; type=image/png");
+    ASSERT_EQ(parts.status, 200);
+    QByteArray all;
+    for (QByteArray block(1, ' '); !block.isEmpty(); all += block)
+        ASSERT_TRUE(std::get<std::unique_ptr<Http::Producer>>(parts.body.front())->next(block).good());
+    EXPECT_EQ(all.count("Content-Type: image/png"), kFrames);
+}
+
+TEST_F(RenderTest, CutsTurnsAndFitsIntoTheViewport)
+{
+    EXPECT_EQ(picture("rendered").size(), QSize(8, 8));
+    EXPECT_EQ(picture("rendered", {{"viewport", "100,40"}}).size(), QSize(40, 40));
+    EXPECT_EQ(picture("rendered", {{"viewport", "4,4"}}).size(), QSize(4, 4));
+    const QVector<Http::Field> turned = {{"viewport", "8,1,0,1,-8,1"}, {"window", "32,64,linear-exact"}};
+    const QImage row = picture("frames/1/rendered", turned);
+    EXPECT_EQ(row.size(), QSize(8, 1));
+    EXPECT_GT(qRed(row.pixel(0, 0)), qRed(row.pixel(7, 0)));
+}
+
+TEST_F(RenderTest, RefusesWithTheRightStatus)
+{
+    const struct
+    {
+        const char* what;
+        Http::Field query;
+        const char* accept;
+        int status;
+    } cases[] = {
+        {"frames/4/rendered", {}, "image/png", 404},
+        {"frames/0/rendered", {}, "image/png", 400},
+        {"frames/1,2/rendered", {}, "image/png", 406},
+        {"rendered", {"window", "1,0,linear"}, "image/png", 400},
+        {"rendered", {"window", "1,nan"}, "image/png", 400},
+        {"rendered", {"window", "1,2,cubic"}, "image/png", 400},
+        {"rendered", {"viewport", "0,5"}, "image/png", 400},
+        {"rendered", {"viewport", "9000,5"}, "image/png", 400},
+        {"rendered", {"viewport", "8,8,20,0"}, "image/png", 400},
+        {"rendered", {"quality", "101"}, "image/png", 400},
+        {"rendered", {}, "image/webp", 406},
+        {"thumbnail", {}, "image/png", 406},
+        {"studies/1.3/rendered", {}, "image/png", 404},
+    };
+    for (const auto& each : cases)
+        EXPECT_EQ(ask(each.what, {each.query}, each.accept).status, each.status)
+            << each.what << " " << each.query.value.constData();
+}
+
+TEST_F(RenderTest, ShowsNoOtherImageThanTheOneThatWasStored)
+{
+    DcmFileFormat other(&aGreyImage().with(DCM_SOPInstanceUID, "1.5").dataset());
+    ASSERT_TRUE(other.saveFile(mFile.constData(), EXS_LittleEndianExplicit).good());
+    EXPECT_EQ(ask("rendered").status, 410);
+    ASSERT_TRUE(QFile::remove(QFile::decodeName(mFile)));
+    const Http::Response gone = ask("rendered");
+    EXPECT_EQ(gone.status, 410);
+    EXPECT_FALSE(body(gone).contains("image.dcm"));
+}
+
+TEST_F(RenderTest, MakesThumbnailsOfWhatIsStoredWhereThatDoes)
+{
+    EXPECT_EQ(QImage::fromData(body(ask("thumbnail", {}, "*/*"))).size(), QSize(256, 256));
+
+    QImage stored(64, 32, QImage::Format_RGB32);
+    stored.fill(Qt::darkGreen);
+    QByteArray preview;
+    QBuffer buffer(&preview);
+    buffer.open(QIODevice::WriteOnly);
+    stored.save(&buffer, "JPEG");
+    store(aGreyImage(), nullptr, preview);
+    for (const char* level : {"studies/1.2/thumbnail", "studies/1.2/series/1.3/thumbnail",
+                              "studies/1.2/series/1.3/instances/1.4/thumbnail"})
+        EXPECT_EQ(body(ask(level, {}, "image/jpeg")), preview) << level;
+    EXPECT_EQ(body(ask("thumbnail", {{"viewport", "256,256"}}, "image/*")), preview);
+    EXPECT_EQ(QImage::fromData(body(ask("thumbnail", {{"viewport", "32,32"}}, "image/jpeg"))).size(),
+              QSize(32, 16));
+    EXPECT_EQ(QImage::fromData(body(ask("frames/2/thumbnail", {}, "image/jpeg"))).size(), QSize(256, 256));
+}
+
+}  // namespace

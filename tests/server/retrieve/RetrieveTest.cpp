@@ -1,0 +1,418 @@
+#include "server/dicomweb/retrieve/BulkDataResource.h"
+#include "server/dicomweb/retrieve/FramesResource.h"
+#include "server/dicomweb/retrieve/InstancesResource.h"
+#include "support/DatasetBuilder.h"
+#include "support/FileContent.h"
+#include "support/LogCapture.h"
+#include "support/RealFiles.h"
+#include "support/TemporaryStore.h"
+
+#include <QFile>
+
+#include <dcmtk/dcmdata/dcrledrg.h>
+#include <dcmtk/dcmdata/dcrleerg.h>
+#include <gtest/gtest.h>
+#include <kddlib/DicomFileReader.h>
+#include <kddlib/Limits.h>
+#include <kddlib/LogFile.h>
+#include <kddlib/OwnAttributes.h>
+#include <kddlib/QAData.h>
+#include <kddlib/TagMap.h>
+
+using namespace Kdd;
+using namespace Kdd::DicomWeb;
+
+namespace
+{
+
+constexpr const char* kInstance = "studies/1.2/series/1.2.3/instances/1.2.3.1";
+constexpr const char* kStored = "application/dicom; transfer-syntax=*";
+constexpr int kFrameBytes = 16 * 16 * 2;
+
+/// So many frames of 16 x 16 words, each frame of other bytes than the others.
+DatasetBuilder anImageWithFrames(int frames, const char* sopUID = "1.2.3.1")
+{
+    QByteArray pixels(frames * kFrameBytes, 0);
+    for (int i = 0; i < pixels.size(); ++i)
+        pixels[i] = static_cast<char>((i / kFrameBytes + 1) * 7 + i % 5);
+    DatasetBuilder image = anImage(sopUID).with(DCM_PatientName, "Wrong^Name").with(DCM_Rows, "16");
+    image.with(DCM_Columns, "16")
+        .with(DCM_BitsAllocated, "16")
+        .with(DCM_BitsStored, "16")
+        .with(DCM_HighBit, "15");
+    image.with(DCM_SamplesPerPixel, "1").with(DCM_PixelRepresentation, "0");
+    image.with(DCM_PhotometricInterpretation, "MONOCHROME2");
+    image.with(DCM_NumberOfFrames, QByteArray::number(frames).constData());
+    auto* element = new DcmPixelData(DcmTag(DCM_PixelData, EVR_OW));
+    element->putUint8Array(reinterpret_cast<const Uint8*>(pixels.constData()),
+                           static_cast<Uint32>(pixels.size()));
+    return image.with(element);
+}
+
+QByteArray frameOf(int number)
+{
+    QByteArray pixels(kFrameBytes, 0);
+    for (int i = 0; i < pixels.size(); ++i)
+        pixels[i] = static_cast<char>((number + 1) * 7 + (number * kFrameBytes + i) % 5);
+    return pixels;
+}
+
+class RetrieveTest : public testing::Test
+{
+protected:
+    RetrieveTest()
+    {
+        DcmRLEEncoderRegistration::registerCodecs();
+        DcmRLEDecoderRegistration::registerCodecs();
+        LogFile::setCallback([](LogFile::Severity, const char*, const std::string&) {});
+        const auto studies = std::make_shared<StudyShelf>(1 << 26, std::chrono::nanoseconds(-1'000'000'000));
+        const auto objects = std::make_shared<ObjectShelf>(1 << 20);
+        mResources.push_back(std::make_unique<FramesResource>(studies, objects));
+        mResources.push_back(std::make_unique<InstancesResource>(studies, objects));
+        mResources.push_back(std::make_unique<BulkDataResource>(studies, objects));
+    }
+    ~RetrieveTest() override { LogFile::setCallback(nullptr); }
+
+    QString path(const char* name) const { return mStore.filePath(name); }
+
+    void write(const char* name, const DatasetBuilder& image,
+               E_TransferSyntax syntax = EXS_LittleEndianExplicit)
+    {
+        DcmDataset copy(image.build());
+        DcmFileFormat file(&copy);
+        ASSERT_TRUE(file.getDataset()->chooseRepresentation(syntax, nullptr).good());
+        ASSERT_TRUE(file.saveFile(path(name).toLocal8Bit().constData(), syntax).good());
+    }
+
+    /// Puts the file into its study's tag file.
+    void add(const QString& path)
+    {
+        DcmFileFormat file;
+        TagFile study;
+        ASSERT_TRUE(readDicomFile(path.toLocal8Bit().constData(), file).good()) << qPrintable(path);
+        std::unique_ptr<TagMap> map(TagMap::createTagMap(file.getDataset(), kDefaultValueBound));
+        map->putAndInsertValue(kFilePath, VrCode::LO, path.toLocal8Bit());
+        study.addTagMap(map.release(), nullptr, true);
+        ASSERT_TRUE(study.mergeIntoCacheFile());
+    }
+
+    void add(const char* name, const DatasetBuilder& image,
+             E_TransferSyntax syntax = EXS_LittleEndianExplicit)
+    {
+        write(name, image, syntax);
+        add(path(name));
+    }
+
+    void correct(const DcmTagKey& key, const char* value, const char* oldStudy = "",
+                 const char* study = "1.2")
+    {
+        QAData job;
+        QString message;
+        job.studyUID = study;
+        job.oldStudyUID = oldStudy;
+        job.images = {"1.2.3.1"};
+        job.substitutions = {{key, QString::fromLatin1(value)}};
+        if (*oldStudy != '\0')
+            job.substitutions.append({DCM_StudyInstanceUID, QString::fromLatin1(study)});
+        EXPECT_TRUE(TagFile::applyQA(job, message)) << qPrintable(message);
+        EXPECT_EQ(job.outcome.changed, 1);
+    }
+
+    Http::Response get(const QByteArray& path, const QByteArray& accept = "*/*", const QByteArray& range = {})
+    {
+        Http::Request request;
+        request.headers = {{"accept", accept}};
+        if (!range.isEmpty())
+            request.headers.append({"range", range});
+        ResourcePath parsed;
+        if (!ResourcePath::parse(path.split('/').toVector(), parsed))
+            return Http::failure(404, QStringLiteral("no path"));
+        for (const auto& resource : mResources) {
+            if (resource->owns(parsed))
+                return resource->answer(request, parsed);
+        }
+        return Http::failure(404, QStringLiteral("nobody's path"));
+    }
+
+    static QByteArray bodyOf(Http::Response& response)
+    {
+        QByteArray body;
+        QByteArray block;
+        for (Http::BodyPart& part : response.body) {
+            if (const auto* bytes = std::get_if<QByteArray>(&part)) {
+                body += *bytes;
+            } else if (const auto* range = std::get_if<Http::FileRange>(&part)) {
+                EXPECT_TRUE(range->file->read(range->offset, range->length, block).good());
+                body += block;
+            } else {
+                auto& producer = *std::get<std::unique_ptr<Http::Producer>>(part);
+                do {
+                    const Result produced = producer.next(block);
+                    if (produced.bad())
+                        return "broken off";
+                    body += block;
+                } while (!block.isEmpty());
+            }
+        }
+        return body;
+    }
+
+    static QByteArray header(const Http::Response& response, const char* name)
+    {
+        for (const Http::Field& field : response.headers) {
+            if (field.name == name)
+                return field.value;
+        }
+        return {};
+    }
+
+    /// The parts of a multipart answer: header lines and body.
+    static QVector<std::pair<QByteArray, QByteArray>> partsOf(Http::Response& response)
+    {
+        const QByteArray type = header(response, "Content-Type");
+        const QByteArray mark = "--" + type.mid(type.indexOf("boundary=") + 9);
+        QByteArray body = bodyOf(response);
+        QVector<std::pair<QByteArray, QByteArray>> parts;
+        for (int at = body.indexOf(mark + "\r\n"); at >= 0;) {
+            const int next = body.indexOf(mark, at + 1);
+            const int head = body.indexOf("\r\n\r\n", at);
+            parts.append({body.mid(at + mark.size() + 2, head - at - mark.size() - 2),
+                          body.mid(head + 4, next - head - 6)});
+            at = body.mid(next + mark.size(), 2) == "--" ? -1 : next;
+        }
+        return parts;
+    }
+
+    static QByteArray nameIn(const QByteArray& dicom, const DcmTagKey& key = DCM_PatientName)
+    {
+        DcmFileFormat file;
+        OFString value;
+        if (readDicomBuffer(dicom, file).bad())
+            return "unreadable: " + dicom.left(60);
+        file.getDataset()->findAndGetOFString(key, value);
+        return QByteArray::fromStdString(value);
+    }
+
+    TemporaryStore mStore;
+    std::vector<std::unique_ptr<Resource>> mResources;
+};
+
+TEST_F(RetrieveTest, GivesFramesInTheOrderAskedFor)
+{
+    add("a.dcm", anImageWithFrames(3));
+    Http::Response response = get(QByteArray(kInstance) + "/frames/3,1,3");
+    EXPECT_TRUE(std::holds_alternative<Http::FileRange>(response.body.at(1))) << "left in the file";
+    const auto parts = partsOf(response);
+    ASSERT_EQ(parts.size(), 3);
+    EXPECT_EQ(parts[0].second, frameOf(2));
+    EXPECT_EQ(parts[1].second, frameOf(0));
+    EXPECT_EQ(parts[2].second, frameOf(2));
+    EXPECT_EQ(parts[0].first, "Content-Type: application/octet-stream; transfer-syntax=1.2.840.10008.1.2.1");
+}
+
+const std::pair<const char*, E_TransferSyntax> kSyntaxes[] = {
+    {"explicit", EXS_LittleEndianExplicit},
+    {"implicit", EXS_LittleEndianImplicit},
+    {"big endian", EXS_BigEndianExplicit},
+    {"deflated", EXS_DeflatedLittleEndianExplicit},
+    {"RLE", EXS_RLELossless},
+};
+
+TEST_F(RetrieveTest, GivesTheSamePixelsFromEverySyntax)
+{
+    for (const auto& [name, syntax] : kSyntaxes) {
+        add("a.dcm", anImageWithFrames(2), syntax);
+        Http::Response frame = get(QByteArray(kInstance) + "/frames/2", "application/octet-stream");
+        EXPECT_EQ(bodyOf(frame), frameOf(1)) << name;
+        Http::Response whole = get(QByteArray(kInstance) + "/pixeldata", "application/octet-stream");
+        EXPECT_EQ(bodyOf(whole), frameOf(0) + frameOf(1)) << name;
+        Http::Response instance = get(kInstance, "application/dicom");
+        DcmFileFormat file;
+        ASSERT_TRUE(readDicomBuffer(bodyOf(instance), file).good()) << name;
+        Uint16 first = 0;
+        EXPECT_TRUE(file.getDataset()->findAndGetUint16(DCM_PixelData, first, kFrameBytes / 2).good())
+            << name;
+        EXPECT_EQ(QByteArray(reinterpret_cast<const char*>(&first), 2), frameOf(1).left(2)) << name;
+        EXPECT_EQ(file.getDataset()->getOriginalXfer(), EXS_LittleEndianExplicit) << name;
+    }
+}
+
+/// A path below the instance, what the client takes, and the status.
+struct Refusal
+{
+    const char* path;
+    const char* accept;
+    int status;
+};
+
+const Refusal kRefusals[] = {
+    {"/frames/0", "*/*", 404},
+    {"/frames/3", "*/*", 404},
+    {"/frames/99999999999", "*/*", 400},
+    {"/frames/1,x", "*/*", 400},
+    {"/frames/+1", "*/*", 400},
+    {"/frames/1,,2", "*/*", 400},
+    {"/frames/-1", "*/*", 400},
+    {"/frames/1", "image/jp2", 406},
+    {"/frames/1,2", "application/octet-stream", 406},
+    {"", "image/jpeg", 406},
+    {"", "application/dicom; transfer-syntax=1.2.840.10008.1.2.4.91", 406},
+    {"/bulkdata/00100010", "image/jpeg", 406},
+    {"/bulkdata/0010001", "*/*", 400},
+    {"/bulkdata/00100010/0", "*/*", 400},
+    {"/bulkdata/00104000", "*/*", 404},
+    {"/bulkdata/00067100", "*/*", 404},
+    {"/pixeldata", "image/gif", 406},
+};
+
+TEST_F(RetrieveTest, RefusesWhatIsNotThereOrCannotBeGiven)
+{
+    add("a.dcm", anImageWithFrames(2));
+    for (const Refusal& row : kRefusals)
+        EXPECT_EQ(get(QByteArray(kInstance) + row.path, row.accept).status, row.status) << row.path;
+    EXPECT_EQ(get("studies/1.9").status, 404);
+    EXPECT_EQ(get("studies/1.2/series/1.9").status, 404);
+    EXPECT_EQ(get("studies/1.2/series/1.9/instances/1.2.3.1").status, 404) << "of another series";
+}
+
+TEST_F(RetrieveTest, ShowsCorrectionsByEveryResource)
+{
+    add("a.dcm", anImageWithFrames(2));
+    EXPECT_EQ(bodyOf(*std::make_unique<Http::Response>(get(kInstance, kStored))), fileContent(path("a.dcm")));
+    correct(DCM_PatientName, "Right^Name");
+    for (const char* accept :
+         {"application/dicom", kStored, "application/dicom; transfer-syntax=1.2.840.10008.1.2"}) {
+        Http::Response instance = get(kInstance, accept);
+        EXPECT_EQ(nameIn(bodyOf(instance)), "Right^Name") << accept;
+    }
+    Http::Response name = get(QByteArray(kInstance) + "/bulkdata/00100010");
+    EXPECT_EQ(bodyOf(name), "Right^Name");
+    Http::Response frame = get(QByteArray(kInstance) + "/frames/1", "application/octet-stream");
+    EXPECT_EQ(bodyOf(frame), frameOf(0));
+}
+
+TEST_F(RetrieveTest, FindsMovedAndRenamedImagesWhereTheyAreNow)
+{
+    add("a.dcm", anImageWithFrames(1));
+    add("b.dcm", anImageWithFrames(1, "1.7.1").inStudy("1.7").inSeries("1.7.7"));
+    correct(DCM_SOPInstanceUID, "1.2.3.9", "1.2", "1.7");
+    const QByteArray moved = "studies/1.7/series/1.2.3/instances/1.2.3.9";
+    Http::Response frame = get(moved + "/frames/1", "application/octet-stream");
+    EXPECT_EQ(bodyOf(frame), frameOf(0));
+    Http::Response instance = get(moved, kStored);
+    const QByteArray dicom = bodyOf(instance);
+    EXPECT_EQ(nameIn(dicom, DCM_SOPInstanceUID), "1.2.3.9");
+    EXPECT_EQ(nameIn(dicom, DCM_StudyInstanceUID), "1.7");
+    EXPECT_EQ(get(QByteArray(kInstance) + "/frames/1").status, 404);
+    EXPECT_EQ(get("studies/1.7/series/1.2.3/instances/1.2.3.1").status, 404);
+}
+
+TEST_F(RetrieveTest, NeverGivesAnotherImage)
+{
+    add("a.dcm", anImageWithFrames(1));
+    const auto statuses = [&] {
+        QVector<int> all;
+        for (const char* below : {"", "/frames/1", "/bulkdata/7FE00010", "/pixeldata"})
+            all.append(get(QByteArray(kInstance) + below).status);
+        return all;
+    };
+    EXPECT_EQ(statuses(), QVector<int>({200, 200, 200, 200}));
+    write("a.dcm", anImageWithFrames(1, "1.2.3.2"));
+    EXPECT_EQ(statuses(), QVector<int>({410, 410, 410, 410})) << "another image's file";
+    write("a.dcm", anImageWithFrames(1).inStudy("1.9"));
+    EXPECT_EQ(statuses(), QVector<int>({410, 410, 410, 410})) << "of another study";
+    QFile(path("a.dcm")).resize(QFile(path("a.dcm")).size() - 10);
+    EXPECT_EQ(statuses(), QVector<int>({500, 500, 500, 500})) << "cut";
+    QFile::remove(path("a.dcm"));
+    EXPECT_EQ(statuses(), QVector<int>({410, 410, 410, 410})) << "gone";
+}
+
+TEST_F(RetrieveTest, PacksStudiesAndLeavesOutWhatIsGone)
+{
+    add("a.dcm", anImageWithFrames(1));
+    add("b.dcm", anImageWithFrames(2, "1.2.3.2"), EXS_RLELossless);
+    add("c.dcm", anImageWithFrames(1, "1.2.3.3").inSeries("1.2.4"));
+    Http::Response study = get("studies/1.2");
+    EXPECT_EQ(study.status, 200);
+    EXPECT_EQ(partsOf(study).size(), 3);
+    Http::Response series =
+        get("studies/1.2/series/1.2.3", "multipart/related; type=application/dicom; transfer-syntax=*");
+    const auto parts = partsOf(series);
+    ASSERT_EQ(parts.size(), 2);
+    const QByteArray compressed = "Content-Type: application/dicom; transfer-syntax=1.2.840.10008.1.2.5";
+    const auto& second = parts[parts[1].first == compressed ? 1 : 0];
+    EXPECT_EQ(second.first, compressed);
+    EXPECT_EQ(second.second, fileContent(path("b.dcm")));
+    Http::Response zip = get("studies/1.2", "application/zip; transfer-syntax=*");
+    EXPECT_TRUE(bodyOf(zip).contains("1.2/1.2.4/1.2.3.3.dcm"));
+    QFile::remove(path("a.dcm"));
+    Http::Response rest = get("studies/1.2");
+    EXPECT_EQ(rest.status, 206);
+    EXPECT_EQ(partsOf(rest).size(), 2);
+}
+
+TEST_F(RetrieveTest, GivesValuesThatWereLeftOutAndRangesOfThem)
+{
+    const QByteArray document = QByteArray("%PDF-") + QByteArray(4995, 'x');
+    DatasetBuilder image = anImage().with(DCM_MIMETypeOfEncapsulatedDocument, "application/pdf");
+    image.withItem(DCM_ContentSequence, anItem());
+    image.withItem(DCM_ContentSequence, anItem().withLong(DCM_TextValue, 3000));
+    auto* element = new DcmOtherByteOtherWord(DCM_EncapsulatedDocument);
+    element->putUint8Array(reinterpret_cast<const Uint8*>(document.constData()),
+                           static_cast<Uint32>(document.size()));
+    add("a.dcm", image.with(element));
+    const QByteArray value = QByteArray(kInstance) + "/bulkdata/00420011";
+    Http::Response whole = get(value);
+    EXPECT_EQ(header(whole, "Content-Type"), "application/pdf");
+    EXPECT_EQ(bodyOf(whole), document);
+    Http::Response part = get(value, "application/octet-stream", "bytes=2-6");
+    EXPECT_EQ(part.status, 206);
+    EXPECT_EQ(header(part, "Content-Range"), "bytes 2-6/5000");
+    EXPECT_EQ(bodyOf(part), document.mid(2, 5));
+    EXPECT_EQ(get(value, "*/*", "bytes=5000-").status, 416);
+    Http::Response nested = get(QByteArray(kInstance) + "/bulkdata/0040A730/1/0040A160");
+    EXPECT_EQ(bodyOf(nested), QByteArray(3000, 'x'));
+    EXPECT_EQ(get(QByteArray(kInstance) + "/bulkdata/0040A730/0/0040A160").status, 404);
+    Http::Response all = get("studies/1.2/bulkdata");
+    const auto parts = partsOf(all);
+    ASSERT_EQ(parts.size(), 2);
+    EXPECT_TRUE(parts[0].first.endsWith(
+                    "Content-Location: series/1.2.3/instances/1.2.3.1/bulkdata/0040A730/1/0040A160") ||
+                parts[1].first.endsWith(
+                    "Content-Location: series/1.2.3/instances/1.2.3.1/bulkdata/0040A730/1/0040A160"));
+}
+
+TEST_F(RetrieveTest, GivesRealFramesAndObjects)
+{
+    if (realFilesFolder().isEmpty())
+        GTEST_SKIP() << "KDD_TEST_DATA is not set";
+    int given = 0;
+    for (const QString& file : realFiles("transfer-syntaxes") + realFiles("multiframe")) {
+        DcmFileFormat dicom;
+        OFString study;
+        OFString series;
+        OFString sop;
+        if (readDicomFile(file.toLocal8Bit().constData(), dicom).bad() ||
+            dicom.getDataset()->findAndGetOFString(DCM_StudyInstanceUID, study).bad() ||
+            dicom.getDataset()->findAndGetOFString(DCM_SeriesInstanceUID, series).bad() ||
+            dicom.getDataset()->findAndGetOFString(DCM_SOPInstanceUID, sop).bad() || study.empty() ||
+            !isUID(QByteArray::fromStdString(series)) || sop.empty())
+            continue;
+        add(file);
+        const QByteArray path =
+            QByteArray::fromStdString("studies/" + study + "/series/" + series + "/instances/" + sop);
+        const bool hasPixels = dicom.getDataset()->tagExists(DCM_PixelData) ||
+                               dicom.getDataset()->tagExists(DCM_FloatPixelData) ||
+                               dicom.getDataset()->tagExists(DCM_DoubleFloatPixelData);
+        Http::Response frame = get(path + "/frames/1");
+        EXPECT_EQ(frame.status, hasPixels ? 200 : 404) << qPrintable(file);
+        Http::Response instance = get(path, kStored);
+        EXPECT_EQ(instance.status, 200) << qPrintable(file);
+        EXPECT_EQ(nameIn(bodyOf(instance), DCM_SOPInstanceUID), QByteArray::fromStdString(sop))
+            << qPrintable(file);
+        ++given;
+    }
+    EXPECT_GT(given, 50);
+}
+
+}  // namespace

@@ -1,0 +1,48 @@
+#include "CommandLineFixture.h"
+
+using namespace Kdd;
+
+namespace
+{
+
+class Serve : public CommandLine
+{
+};
+
+TEST_F(Serve, TellsItsAddressesAndEndsWhenItIsAsked)
+{
+    const auto process = start("--json serve --listen [::1]:0 --status 127.0.0.1:0 --threads 1");
+    ASSERT_TRUE(process->waitForReadyRead(kTimeout)) << process->readAllStandardError().toStdString();
+    const QJsonObject told = QJsonDocument::fromJson(process->readLine()).object();
+    EXPECT_TRUE(told.value(QLatin1String("address")).toString().startsWith(QLatin1String("http://[::1]:")));
+    EXPECT_TRUE(
+        told.value(QLatin1String("status")).toString().startsWith(QLatin1String("http://127.0.0.1:")));
+    process->terminate();
+    EXPECT_EQ(finish(*process).exitCode, 0);
+}
+
+TEST_F(Serve, SaysWhyItDoesNotBegin)
+{
+    const struct
+    {
+        const char* arguments;
+        int exitCode;
+        const char* reason;
+    } kRefusals[] = {
+        {"serve --listen 8042", 2, "\"8042\" is no address to listen at"},
+        {"serve --listen 0.0.0.0:0", 1, "0.0.0.0:0 can be reached by other machines"},
+        {"serve --tls-key key.pem", 2, "TLS takes both a certificate and a key"},
+        {"serve --listen 127.0.0.1:0 --tls-cert none.pem --tls-key none.pem", 1, "none.pem: "},
+        {"serve --listen 127.0.0.1:0 --viewer none", 1, "none: there is no viewer"},
+        {"serve --listen 127.0.0.1:0 --public images", 1, "images is no public address"},
+        {"serve --listen 127.0.0.1:0 --host a/b", 1, "a/b is no name of a host"},
+    };
+    for (const auto& refusal : kRefusals) {
+        const Answer answer = kdd(refusal.arguments);
+        EXPECT_EQ(answer.exitCode, refusal.exitCode) << refusal.arguments;
+        EXPECT_TRUE(answer.err.contains(refusal.reason)) << answer.err.toStdString();
+        EXPECT_EQ(answer.out, "");
+    }
+}
+
+}  // namespace
