@@ -81,14 +81,15 @@ void put(SqlConnection& connection, qint64 studyId, const StudySearchRecord& stu
         instances += series.instances;
     if (connection.change("INSERT INTO study_search (study_id, uid, is_built, file_size, file_modified, digest,"
                           " study_date, study_time, accession_number, patient_id, patient_birth_date,"
-                          " patient_sex, study_code, sort_name, modalities, series_count, instance_count)"
+                          " patient_sex, study_code, sort_name, name_words, modalities, series_count, instance_count)"
                           " SELECT id, uid, CAST(? AS SMALLINT), CAST(? AS BIGINT), CAST(? AS BIGINT), ?, ?, ?,"
-                          " ?, ?, ?, ?, ?, ?, ?, CAST(? AS BIGINT), CAST(? AS BIGINT) FROM study WHERE id = ?",
+                          " ?, ?, ?, ?, ?, ?, ?, ?, CAST(? AS BIGINT), CAST(? AS BIGINT) FROM study WHERE id = ?",
                           {isBuilt ? 1 : 0, tagFile.fileSize, tagFile.modified, bytesValue(tagFile.digest),
                            textValue(study.date), textValue(study.time), textValue(study.accessionNumber),
                            textValue(study.patientID), textValue(study.patientBirthDate),
                            textValue(study.patientSex), textValue(study.studyID),
                            textValue(sortName(QString::fromUtf8(study.patientName))),
+                           textValue(names(study.patientName)),
                            textValue(modalities.join('\\')), static_cast<qint64>(study.series.size()), instances,
                            studyId}) == 0)
         return;

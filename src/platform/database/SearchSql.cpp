@@ -169,8 +169,12 @@ private:
     void addWords(SearchSql& sql, const QByteArray& column, const QByteArray& pattern)
     {
         const QVariant whole = textValue(mDialect.pattern(pattern));
-        if (mFrequent.contains(pattern)) {
-            append(sql, matches("(SELECT w." + column + " FROM study_words w WHERE w.study_id = s.study_id)"), {whole});
+        // Names stand in the rows of the list as well.
+        const bool isName = column == "patient_name";
+        const QByteArray ofRow = isName ? QByteArray("s.name_words")
+                                        : "(SELECT w." + column + " FROM study_words w WHERE w.study_id = s.study_id)";
+        if (mFrequent.contains(pattern) || (isName && !mDialect.hasMatchIndex)) {
+            append(sql, matches(ofRow), {whole});
             return;
         }
         const QByteArray part = longestPart(pattern);
@@ -181,7 +185,7 @@ private:
             append(sql, "s.study_id IN (SELECT w.study_id FROM study_words w WHERE " + matches("w." + column) + ')',
                    {whole});
         else if (pattern != '*' + part + '*')
-            append(sql, matches("(SELECT w." + column + " FROM study_words w WHERE w.study_id = s.study_id)"), {whole});
+            append(sql, matches(ofRow), {whole});
     }
 
     void addModalities(const SearchTerm& term)

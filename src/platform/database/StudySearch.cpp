@@ -70,6 +70,9 @@ struct StudySearch::Private
     /// The patterns of the query that many studies have.
     Kdd::Result findFrequent(const SearchQuery& query, QSet<QByteArray>& frequent)
     {
+        // The other engine knows by its statistics.
+        if (!dialect().hasMatchIndex)
+            return {};
         return transact(Access::Read, [&] {
             for (const SearchTerm& term : query.terms) {
                 for (const QByteArray& pattern : term.patterns) {
