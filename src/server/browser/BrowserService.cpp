@@ -4,6 +4,7 @@
 #include "server/browser/PageAnswer.h"
 #include "server/browser/StudyAnswer.h"
 #include "server/browser/StudySizes.h"
+#include "server/dicomweb/ResourcePath.h"
 
 #include <kddlib/TagFile.h>
 
@@ -13,9 +14,6 @@ namespace
 {
 
 constexpr const char* kMethods = "GET, HEAD, OPTIONS";
-
-// Some writers give studies names that are no UIDs. They are found under any name that the image database takes [bytes].
-constexpr int kMaxStudyName = 256;
 
 // Seconds after which a study that is being written is asked for again.
 constexpr const char* kPatience = "2";
@@ -84,7 +82,7 @@ Http::Response BrowserService::find(const Http::Request& request) const
         return pageAnswer(request, path[1]);
     if (path.size() == 2 && path[0] == "browser" && path[1] == "config")
         return config(request);
-    if (path.size() >= 3 && path[0] == "browser" && path[1] == "studies" && path[2].size() <= kMaxStudyName)
+    if (path.size() >= 3 && path[0] == "browser" && path[1] == "studies" && DicomWeb::isUID(path[2]))
         return study(request, path[2], path.mid(3));
     return notFound();
 }

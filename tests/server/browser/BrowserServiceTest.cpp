@@ -116,14 +116,12 @@ TEST_F(BrowserTest, NamesAnImageWithoutUIDWithoutTellingItsPath)
         EXPECT_FALSE(bodyOf(get(target)).contains("secret")) << target.constData();
 }
 
-TEST_F(BrowserTest, OpensAStudyAndASeriesWhoseUIDsAreNone)
+TEST_F(BrowserTest, OpensASeriesWhoseUIDIsNone)
 {
-    write({image("1.4").inStudy("05fa-odd").inSeries("a/b")});
-    const QJsonValue series = json("/browser/studies/05fa-odd")[QStringLiteral("series")].toArray()[0];
+    write({image("1.4").inSeries("a/b")});
+    const QJsonValue series = json("/browser/studies/1.2")[QStringLiteral("series")].toArray()[0];
     const QByteArray key = series[QStringLiteral("key")].toString().toLatin1();
-    EXPECT_EQ(json("/browser/studies/05fa-odd/series/" + key + "/images")[QStringLiteral("count")].toInt(),
-              1);
-    EXPECT_EQ(get("/browser/studies/" + QByteArray(5000, '1')).status, 404);
+    EXPECT_EQ(json("/browser/studies/1.2/series/" + key + "/images")[QStringLiteral("count")].toInt(), 1);
 }
 
 TEST_F(BrowserTest, SendsThePageCompressedAndOnlyWhenItIsNew)
