@@ -68,7 +68,7 @@ protected:
     {
         const QList<QByteArray> parts = QByteArray(target).split('?');
         Http::Request request;
-        request.base = "http://host";
+        request.base = "http://host/dicom-web";
         request.path.append("dicom-web");
         for (const QByteArray& segment : parts.front().split('/'))
             request.path.append(segment);
