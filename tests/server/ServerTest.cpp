@@ -98,7 +98,7 @@ TEST_F(ServerTest, CountsRequestsByGroupsOfItsOwn)
     const auto server = started();
     for (const char* path : {"/dicom-web/studies?PatientName=Doe", "/dicom-web/studies/1.2/metadata"})
         EXPECT_NE(get(server->address(), path).status, 0);
-    for (const char* path : {"/a/b", "/c", "/dicom-web/studies/1.2/series/x", "/dicom-web/madeup"})
+    for (const char* path : {"/a/b", "/c", "/dicom-web/studies/1.2/series/1.3/madeup", "/dicom-web/madeup"})
         EXPECT_EQ(get(server->address(), path).status, 404) << path;
     const QByteArray text = get(server->statusAddress(), "/metrics").body;
     EXPECT_TRUE(text.contains("kdd_http_request_duration_seconds_count{route=\"studies\"} 1\n"));

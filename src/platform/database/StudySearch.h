@@ -146,7 +146,7 @@ public:
     Kdd::Result explainStudies(const SearchQuery& query, QByteArray& plan);
 
 private:
-    struct Private;
+    struct KDD_LOCAL Private;
     explicit StudySearch(std::unique_ptr<Private> made);
     std::unique_ptr<Private> d;
 };
