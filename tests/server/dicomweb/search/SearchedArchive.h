@@ -79,7 +79,7 @@ protected:
                                       QByteArray::fromPercentEncoding(field.mid(equals + 1))});
         }
         ResourcePath resource;
-        EXPECT_TRUE(ResourcePath::parse(request.path.mid(1), resource));
+        EXPECT_TRUE(ResourcePath::parse(request.path, resource));
         SearchResource search(*mDatabase, mShelf);
         ChangeFeed feed(*mDatabase);
         return search.owns(resource) ? search.answer(request, resource) : feed.answer(request, resource);
