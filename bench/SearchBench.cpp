@@ -43,8 +43,8 @@ public:
 private:
     QByteArray syllable()
     {
-        static const char* const kBegin[] = {"b", "d", "f", "g", "h", "k", "l", "m", "n", "p", "r", "s", "t", "v", "w",
-                                             "z", "sch", "ch", "st", "br", "kr", "tr"};
+        static const char* const kBegin[] = {"b", "d", "f", "g", "h", "k",   "l",  "m",  "n",  "p",  "r",
+                                             "s", "t", "v", "w", "z", "sch", "ch", "st", "br", "kr", "tr"};
         static const char* const kEnd[] = {"a", "e", "i", "o", "u", "er", "an", "en", "el", "in", "ow", "ai"};
         // The smaller of two draws: some are frequent, most are not.
         return QByteArray(kBegin[std::min(pick(22), pick(22))]) + kEnd[std::min(pick(12), pick(12))];
@@ -61,8 +61,9 @@ private:
 
 StudySearchRecord madeUp(People& people, int number)
 {
-    static const std::array<const char*, 20> kModalities = {"CT", "CT", "CT", "CT", "CT", "CR", "CR", "CR", "DX", "DX",
-                                                            "DX", "MR", "MR", "MR", "MR", "US", "US", "MG", "XA", "PT"};
+    static const std::array<const char*, 20> kModalities = {"CT", "CT", "CT", "CT", "CT", "CR", "CR",
+                                                            "CR", "DX", "DX", "DX", "MR", "MR", "MR",
+                                                            "MR", "US", "US", "MG", "XA", "PT"};
     static const char* const kRegions[] = {"Head", "Chest", "Abdomen", "Knee left", "Spine", "Pelvis"};
     StudySearchRecord study;
     study.patientName = people.name();
@@ -75,9 +76,11 @@ StudySearchRecord madeUp(People& people, int number)
     study.studyID = QByteArray::number(number);
     study.patientSex = people.pick(2) == 0 ? "F" : "M";
     study.patientBirthDate = "19600101";
-    study.attributes = "00100010{\"vr\":\"PN\",\"Value\":[{\"Alphabetic\":\"" + study.patientName + "\"}]}\n" +
-                       QByteArray("00081030{\"vr\":\"LO\",\"Value\":[\"made up for the bench\"]}\n").repeated(20);
-    const QByteArray modality = number % 1000 == 0 ? "OPT" : kModalities[static_cast<size_t>(people.pick(20))];
+    study.attributes =
+        "00100010{\"vr\":\"PN\",\"Value\":[{\"Alphabetic\":\"" + study.patientName + "\"}]}\n" +
+        QByteArray("00081030{\"vr\":\"LO\",\"Value\":[\"made up for the bench\"]}\n").repeated(20);
+    const QByteArray modality =
+        number % 1000 == 0 ? "OPT" : kModalities[static_cast<size_t>(people.pick(20))];
     for (int i = 0; i < 3; ++i) {
         SeriesSearchRecord series;
         series.uid = "1.2.3." + QByteArray::number(number) + '.' + QByteArray::number(i);
@@ -198,7 +201,8 @@ const bool kDeclared = [] {
     declare("search/accession", {is(SearchColumn::AccessionNumber, "A1004711")});
     declare("search/modality", {is(SearchColumn::ModalitiesInStudy, "CT")});
     declare("search/modalityRare", {is(SearchColumn::ModalitiesInStudy, "OPT")});
-    declare("search/modalityInYear", {is(SearchColumn::ModalitiesInStudy, "OPT"), dates("20200101", "20201231")});
+    declare("search/modalityInYear",
+            {is(SearchColumn::ModalitiesInStudy, "OPT"), dates("20200101", "20201231")});
     declare("search/modalityAndName", {is(SearchColumn::ModalitiesInStudy, "MR"), name("*sch*")});
     declare("search/byName", {}, 0, SearchColumn::PatientName);
     declare("search/byPatientID", {}, 5000, SearchColumn::PatientID);

@@ -45,7 +45,8 @@ void checkSearch(const QVector<Http::Field>& query, const char* resource)
         all.push_back(&condition);
     }
     // What is looked at once more is a part of what was asked.
-    require(plan.onStudy.size() + plan.onSeries.size() + plan.onImages.size() <= all.size(), "no condition is made up");
+    require(plan.onStudy.size() + plan.onSeries.size() + plan.onImages.size() <= all.size(),
+            "no condition is made up");
     for (const Http::Field& field : query)
         holdAll(all, OneValue(QString::fromUtf8(field.value)), request.zone);
 }

@@ -12,7 +12,8 @@ void noteChange(SqlConnection& connection, const StudyChangeNote& change)
                       " SELECT COALESCE(MAX(position), 0) + 1, CAST(? AS SMALLINT), CAST(? AS TEXT),"
                       " CAST(? AS TEXT), CAST(? AS TEXT), CAST(? AS BIGINT), CAST(? AS BIGINT) FROM change",
                       {static_cast<int>(change.kind), textValue(change.studyInstanceUID),
-                       textValue(change.movedFrom), textValue(change.movedTo), change.instances, presentMs()});
+                       textValue(change.movedFrom), textValue(change.movedTo), change.instances,
+                       presentMs()});
 }
 
 std::vector<StudyChangeNote> changesAfter(SqlConnection& connection, qint64 position, int limit)

@@ -104,7 +104,8 @@ const QStringList kSteps[] = {
             " digest {bytes} NOT NULL, study_date {text} NOT NULL, study_time {text} NOT NULL,"
             " accession_number {text} NOT NULL, patient_id {text} NOT NULL,"
             " patient_birth_date {text} NOT NULL, patient_sex {text} NOT NULL, study_code {text} NOT NULL,"
-            " sort_name {text} NOT NULL, name_words {text} NOT NULL, modalities {text} NOT NULL, series_count BIGINT NOT NULL,"
+            " sort_name {text} NOT NULL, name_words {text} NOT NULL, modalities {text} NOT NULL, "
+            "series_count BIGINT NOT NULL,"
             " instance_count BIGINT NOT NULL)"),
         QStringLiteral("CREATE INDEX study_search_by_date ON study_search"
                        " (study_date DESC, study_time DESC, uid)"),

@@ -65,41 +65,41 @@ void putSeries(SqlConnection& connection, qint64 studyId, const SeriesSearchReco
                        textValue(series.performedDate), textValue(series.performedTime), series.instances,
                        bytesValue(series.attributes)});
     for (const auto& request : series.requests)
-        connection.change("INSERT INTO series_request (study_id, uid, scheduled_step, requested_procedure)"
-                          " VALUES (?, ?, ?, ?)",
-                          {studyId, textValue(series.uid), textValue(request.first),
-                           textValue(request.second)});
+        connection.change(
+            "INSERT INTO series_request (study_id, uid, scheduled_step, requested_procedure)"
+            " VALUES (?, ?, ?, ?)",
+            {studyId, textValue(series.uid), textValue(request.first), textValue(request.second)});
 }
 
-void put(SqlConnection& connection, qint64 studyId, const StudySearchRecord& study, const TagFileStamp& tagFile,
-         bool isBuilt)
+void put(SqlConnection& connection, qint64 studyId, const StudySearchRecord& study,
+         const TagFileStamp& tagFile, bool isBuilt)
 {
     removeSearchRows(connection, studyId);
     const QList<QByteArray> modalities = modalitiesOf(study);
     qint64 instances = 0;
     for (const SeriesSearchRecord& series : study.series)
         instances += series.instances;
-    if (connection.change("INSERT INTO study_search (study_id, uid, is_built, file_size, file_modified, digest,"
-                          " study_date, study_time, accession_number, patient_id, patient_birth_date,"
-                          " patient_sex, study_code, sort_name, name_words, modalities, series_count, instance_count)"
-                          " SELECT id, uid, CAST(? AS SMALLINT), CAST(? AS BIGINT), CAST(? AS BIGINT), ?, ?, ?,"
-                          " ?, ?, ?, ?, ?, ?, ?, ?, CAST(? AS BIGINT), CAST(? AS BIGINT) FROM study WHERE id = ?",
-                          {isBuilt ? 1 : 0, tagFile.fileSize, tagFile.modified, bytesValue(tagFile.digest),
-                           textValue(study.date), textValue(study.time), textValue(study.accessionNumber),
-                           textValue(study.patientID), textValue(study.patientBirthDate),
-                           textValue(study.patientSex), textValue(study.studyID),
-                           textValue(sortName(QString::fromUtf8(study.patientName))),
-                           textValue(names(study.patientName)),
-                           textValue(modalities.join('\\')), static_cast<qint64>(study.series.size()), instances,
-                           studyId}) == 0)
+    if (connection.change(
+            "INSERT INTO study_search (study_id, uid, is_built, file_size, file_modified, digest,"
+            " study_date, study_time, accession_number, patient_id, patient_birth_date,"
+            " patient_sex, study_code, sort_name, name_words, modalities, series_count, instance_count)"
+            " SELECT id, uid, CAST(? AS SMALLINT), CAST(? AS BIGINT), CAST(? AS BIGINT), ?, ?, ?,"
+            " ?, ?, ?, ?, ?, ?, ?, ?, CAST(? AS BIGINT), CAST(? AS BIGINT) FROM study WHERE id = ?",
+            {isBuilt ? 1 : 0, tagFile.fileSize, tagFile.modified, bytesValue(tagFile.digest),
+             textValue(study.date), textValue(study.time), textValue(study.accessionNumber),
+             textValue(study.patientID), textValue(study.patientBirthDate), textValue(study.patientSex),
+             textValue(study.studyID), textValue(sortName(QString::fromUtf8(study.patientName))),
+             textValue(names(study.patientName)), textValue(modalities.join('\\')),
+             static_cast<qint64>(study.series.size()), instances, studyId}) == 0)
         return;
     connection.change("INSERT INTO study_answer (study_id, attributes) VALUES (?, ?)",
                       {studyId, bytesValue(study.attributes)});
-    connection.change("INSERT INTO study_words (study_id, patient_name, referring_physician, description, patient_id,"
-                      " accession_number, study_code) VALUES (?, ?, ?, ?, ?, ?, ?)",
-                      {studyId, textValue(names(study.patientName)), textValue(names(study.referringPhysician)),
-                       textValue(words(study.description)), textValue(words(study.patientID)),
-                       textValue(words(study.accessionNumber)), textValue(words(study.studyID))});
+    connection.change(
+        "INSERT INTO study_words (study_id, patient_name, referring_physician, description, patient_id,"
+        " accession_number, study_code) VALUES (?, ?, ?, ?, ?, ?, ?)",
+        {studyId, textValue(names(study.patientName)), textValue(names(study.referringPhysician)),
+         textValue(words(study.description)), textValue(words(study.patientID)),
+         textValue(words(study.accessionNumber)), textValue(words(study.studyID))});
     for (const QByteArray& modality : modalities)
         connection.change("INSERT INTO study_modality (modality, study_date, study_time, uid, study_id)"
                           " SELECT CAST(? AS TEXT), study_date, study_time, uid, study_id FROM study_search"
@@ -127,7 +127,8 @@ public:
             values.append(text.toInt());
         else
             values.append(text);
-        const QJsonObject element{{QStringLiteral("vr"), QLatin1String(vr)}, {QStringLiteral("Value"), values}};
+        const QJsonObject element{{QStringLiteral("vr"), QLatin1String(vr)},
+                                  {QStringLiteral("Value"), values}};
         mText += key + QJsonDocument(element).toJson(QJsonDocument::Compact) + '\n';
     }
 

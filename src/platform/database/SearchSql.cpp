@@ -119,7 +119,8 @@ public:
     {
         SearchSql all = mSeries;
         if (!mRequest.text.isEmpty()) {
-            all.text += " AND EXISTS (SELECT 1 FROM series_request q WHERE q.study_id = r.study_id AND q.uid = r.uid" +
+            all.text += " AND EXISTS (SELECT 1 FROM series_request q WHERE q.study_id = r.study_id AND q.uid "
+                        "= r.uid" +
                         mRequest.text + ')';
             all.values += mRequest.values;
         }
@@ -149,7 +150,10 @@ private:
             addRange(sql, term, name);
     }
 
-    QByteArray matches(const QByteArray& column) const { return mDialect.wordsOf.arg(QLatin1String(column)).toLatin1(); }
+    QByteArray matches(const QByteArray& column) const
+    {
+        return mDialect.wordsOf.arg(QLatin1String(column)).toLatin1();
+    }
 
     void addRange(SearchSql& sql, const SearchTerm& term, const QByteArray& name)
     {
@@ -171,8 +175,9 @@ private:
         const QVariant whole = textValue(mDialect.pattern(pattern));
         // Names stand in the rows of the list as well.
         const bool isName = column == "patient_name";
-        const QByteArray ofRow = isName ? QByteArray("s.name_words")
-                                        : "(SELECT w." + column + " FROM study_words w WHERE w.study_id = s.study_id)";
+        const QByteArray ofRow =
+            isName ? QByteArray("s.name_words")
+                   : "(SELECT w." + column + " FROM study_words w WHERE w.study_id = s.study_id)";
         if (mFrequent.contains(pattern) || (isName && !mDialect.hasMatchIndex)) {
             append(sql, matches(ofRow), {whole});
             return;
@@ -182,7 +187,9 @@ private:
             append(sql, "s.study_id IN (SELECT rowid FROM study_parts WHERE study_parts MATCH ?)",
                    {textValue(phrase(column, part))});
         if (!mDialect.hasMatchIndex || part.size() < kIndexedPart)
-            append(sql, "s.study_id IN (SELECT w.study_id FROM study_words w WHERE " + matches("w." + column) + ')',
+            append(sql,
+                   "s.study_id IN (SELECT w.study_id FROM study_words w WHERE " + matches("w." + column) +
+                       ')',
                    {whole});
         else if (pattern != '*' + part + '*')
             append(sql, matches(ofRow), {whole});
@@ -198,18 +205,20 @@ private:
             condition += " AND " + matches("m.modality");
             values << textValue(mDialect.pattern(pattern));
         }
-        append(mStudy, "EXISTS (SELECT 1 FROM study_modality m WHERE m.study_id = s.study_id" + condition + ')',
+        append(mStudy,
+               "EXISTS (SELECT 1 FROM study_modality m WHERE m.study_id = s.study_id" + condition + ')',
                values);
     }
 
     /// Files that wait to be built in are among them; whoever shows images looks for them in the tag file.
     void addImages(const SearchTerm& term)
     {
-        append(mSeries,
-               "(r.study_id, r.uid) IN (SELECT t.study_id, t.uid FROM file f JOIN series t ON t.id = f.series_id"
-               " WHERE f.kind = 1 AND f.sop_uid IN (?" +
-                   QByteArray(", ?").repeated(qMax(1, term.values.size()) - 1) + "))",
-               texts(term.values));
+        append(
+            mSeries,
+            "(r.study_id, r.uid) IN (SELECT t.study_id, t.uid FROM file f JOIN series t ON t.id = f.series_id"
+            " WHERE f.kind = 1 AND f.sop_uid IN (?" +
+                QByteArray(", ?").repeated(qMax(1, term.values.size()) - 1) + "))",
+            texts(term.values));
     }
 
     static QVariantList texts(const QVector<QByteArray>& values)
@@ -227,8 +236,9 @@ private:
     SearchSql mRequest;
 };
 
-const char kStudyColumns[] = "s.study_id, s.uid, s.is_built, s.file_size, s.file_modified, s.digest, s.modalities,"
-                             " s.series_count, s.instance_count";
+const char kStudyColumns[] =
+    "s.study_id, s.uid, s.is_built, s.file_size, s.file_modified, s.digest, s.modalities,"
+    " s.series_count, s.instance_count";
 
 bool isNewestFirst(const SearchQuery& query)
 {
@@ -269,8 +279,9 @@ bool isWalked(const SearchTerm& term, const QSet<QByteArray>& frequent)
     if (!term.values.isEmpty())
         return false;
     return term.column == SearchColumn::StudyDate ||
-           (!term.patterns.isEmpty() && std::all_of(term.patterns.begin(), term.patterns.end(),
-                                                    [&](const QByteArray& each) { return frequent.contains(each); }));
+           (!term.patterns.isEmpty() &&
+            std::all_of(term.patterns.begin(), term.patterns.end(),
+                        [&](const QByteArray& each) { return frequent.contains(each); }));
 }
 
 /// The one modality that is asked for and nothing that narrows the search more.
@@ -278,7 +289,8 @@ const SearchTerm* leadingModality(const SearchQuery& query, const QSet<QByteArra
 {
     const SearchTerm* modality = nullptr;
     for (const SearchTerm& term : query.terms) {
-        if (term.column == SearchColumn::ModalitiesInStudy && term.values.size() == 1 && term.patterns.isEmpty())
+        if (term.column == SearchColumn::ModalitiesInStudy && term.values.size() == 1 &&
+            term.patterns.isEmpty())
             modality = &term;
         else if (!isWalked(term, frequent))
             return nullptr;
@@ -302,8 +314,9 @@ SearchSql studiesFrom(const SqlDialect& dialect, const SearchQuery& query, bool 
         // Both tables have the columns that are asked of and sorted by.
         SearchSql dates = conditions.study();
         dates.text.replace("s.study_", "m.study_");
-        sql.text = " FROM study_modality m JOIN study_search s ON s.study_id = m.study_id WHERE m.modality = ?" +
-                   dates.text;
+        sql.text =
+            " FROM study_modality m JOIN study_search s ON s.study_id = m.study_id WHERE m.modality = ?" +
+            dates.text;
         sql.values << textValue(leading->values.front());
         sql.values += dates.values;
         return sql;
@@ -312,7 +325,8 @@ SearchSql studiesFrom(const SqlDialect& dialect, const SearchQuery& query, bool 
     sql.values = conditions.study().values;
     if (conditions.hasSeries()) {
         const SearchSql series = conditions.series();
-        sql.text += " AND s.study_id IN (SELECT r.study_id FROM series_search r WHERE 1 = 1" + series.text + ')';
+        sql.text +=
+            " AND s.study_id IN (SELECT r.study_id FROM series_search r WHERE 1 = 1" + series.text + ')';
         sql.values += series.values;
     }
     return sql;
@@ -326,8 +340,8 @@ SearchSql seriesFrom(const SqlDialect& dialect, const SearchQuery& query)
         conditions.add(term);
     const SearchSql series = conditions.series();
     SearchSql sql;
-    sql.text = " FROM series_search r JOIN study_search s ON s.study_id = r.study_id WHERE 1 = 1" + series.text +
-               conditions.study().text;
+    sql.text = " FROM series_search r JOIN study_search s ON s.study_id = r.study_id WHERE 1 = 1" +
+               series.text + conditions.study().text;
     sql.values = series.values + conditions.study().values;
     return sql;
 }
@@ -348,7 +362,8 @@ SearchSql counted(const SearchSql& from, int most)
 
 }  // namespace
 
-SearchSql countPartsSql(const SqlDialect& dialect, const SearchTerm& term, const QByteArray& pattern, int most)
+SearchSql countPartsSql(const SqlDialect& dialect, const SearchTerm& term, const QByteArray& pattern,
+                        int most)
 {
     const char* const column = columnOf(term.column).words;
     const QByteArray part = longestPart(pattern);
@@ -392,9 +407,10 @@ SearchSql seriesSql(const SqlDialect& dialect, const SearchQuery& query)
 SearchSql patientsSql(const SqlDialect& dialect, const SearchQuery& query)
 {
     SearchSql sql = studiesFrom(dialect, query, false);
-    sql.text = "SELECT page.studies, a.attributes FROM (SELECT s.sort_name, s.patient_id, COUNT(*) AS studies,"
-               " MAX(s.study_id) AS study_id" +
-               sql.text + " GROUP BY s.sort_name, s.patient_id ORDER BY s.sort_name, s.patient_id";
+    sql.text =
+        "SELECT page.studies, a.attributes FROM (SELECT s.sort_name, s.patient_id, COUNT(*) AS studies,"
+        " MAX(s.study_id) AS study_id" +
+        sql.text + " GROUP BY s.sort_name, s.patient_id ORDER BY s.sort_name, s.patient_id";
     addPage(sql, query);
     sql.text += ") page JOIN study_answer a ON a.study_id = page.study_id"
                 " ORDER BY page.sort_name, page.patient_id";

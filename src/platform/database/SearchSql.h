@@ -18,12 +18,14 @@ struct SearchSql
 
 /// How many texts have what a pattern asks for, counted up to `most`; an empty text when it has no part that the index
 /// knows, or the engine decides by itself.
-SearchSql countPartsSql(const SqlDialect& dialect, const SearchTerm& term, const QByteArray& pattern, int most);
+SearchSql countPartsSql(const SqlDialect& dialect, const SearchTerm& term, const QByteArray& pattern,
+                        int most);
 
 // Studies: id, uid, is_built, file_size, file_modified, digest, modalities, series, instances, attributes.
 //
 // `frequent` are the patterns that so many studies have that walking the list finds a page sooner than the index.
-SearchSql studiesSql(const SqlDialect& dialect, const SearchQuery& query, const QSet<QByteArray>& frequent = {});
+SearchSql studiesSql(const SqlDialect& dialect, const SearchQuery& query,
+                     const QSet<QByteArray>& frequent = {});
 
 // Series: the same of the study, then uid, instances, attributes.
 SearchSql seriesSql(const SqlDialect& dialect, const SearchQuery& query);

@@ -9,7 +9,8 @@ namespace Kxg
 namespace
 {
 
-const char kColumns[] = "patient_name, referring_physician, description, patient_id, accession_number, study_code";
+const char kColumns[] =
+    "patient_name, referring_physician, description, patient_id, accession_number, study_code";
 
 // Whatever of it fails must leave the transaction around it whole.
 bool makePostgresIndex(SqlConnection& connection)
@@ -23,14 +24,15 @@ bool makePostgresIndex(SqlConnection& connection)
             columns << column + QStringLiteral(" gin_trgm_ops");
         connection.execute(QStringLiteral("CREATE INDEX study_words_parts ON study_words USING gin (%1)")
                                .arg(columns.join(QStringLiteral(", "))));
-        connection.execute(
-            QStringLiteral("CREATE INDEX study_search_parts ON study_search USING gin (name_words gin_trgm_ops)"));
+        connection.execute(QStringLiteral(
+            "CREATE INDEX study_search_parts ON study_search USING gin (name_words gin_trgm_ops)"));
         connection.execute(QStringLiteral("RELEASE SAVEPOINT words_index"));
         return true;
     } catch (const DatabaseError& error) {
         connection.execute(QStringLiteral("ROLLBACK TO SAVEPOINT words_index"));
-        Kdd::LogFile::warnf("Searches for parts of texts read all of them, for the server has no index for that: %s",
-                            error.what());
+        Kdd::LogFile::warnf(
+            "Searches for parts of texts read all of them, for the server has no index for that: %s",
+            error.what());
         return false;
     }
 }
@@ -51,17 +53,19 @@ void makeWordsTable(SqlConnection& connection)
     const SqlDialect& dialect = SqlDialect::of(connection.address().engine);
     QString columns = QString::fromLatin1(kColumns);
     columns.replace(QLatin1String(", "), QLatin1Char(' ') + dialect.text + QLatin1String(" NOT NULL, "));
-    connection.execute(QStringLiteral("CREATE TABLE study_words (study_id %1 NOT NULL PRIMARY KEY, %2 %3 NOT NULL)")
-                           .arg(dialect.key, columns, dialect.text));
+    connection.execute(
+        QStringLiteral("CREATE TABLE study_words (study_id %1 NOT NULL PRIMARY KEY, %2 %3 NOT NULL)")
+            .arg(dialect.key, columns, dialect.text));
     if (!dialect.hasMatchIndex) {
         makePostgresIndex(connection);
         return;
     }
     // The index knows the table and is told of each change of it. So texts are read without it, too, which is faster
     // where many have the part, and where the part is too short for it.
-    connection.execute(QStringLiteral("CREATE VIRTUAL TABLE study_parts USING fts5 (%1, content = 'study_words',"
-                                      " content_rowid = 'study_id', tokenize = 'trigram case_sensitive 1')")
-                           .arg(QLatin1String(kColumns)));
+    connection.execute(
+        QStringLiteral("CREATE VIRTUAL TABLE study_parts USING fts5 (%1, content = 'study_words',"
+                       " content_rowid = 'study_id', tokenize = 'trigram case_sensitive 1')")
+            .arg(QLatin1String(kColumns)));
     connection.execute(QStringLiteral("CREATE TRIGGER study_words_come AFTER INSERT ON study_words BEGIN"
                                       " INSERT INTO study_parts (rowid, %1) VALUES (new.study_id, %2); END")
                            .arg(QLatin1String(kColumns), columnsOf("new.")));

@@ -83,7 +83,8 @@ QByteArray SqlDialect::pattern(const QByteArray& stars) const
         else if (each == '*')
             written += '%';
         else
-            written += each == '%' || each == '_' || each == '\\' ? QByteArray("\\") + each : QByteArray(1, each);
+            written +=
+                each == '%' || each == '_' || each == '\\' ? QByteArray("\\") + each : QByteArray(1, each);
     }
     return written;
 }

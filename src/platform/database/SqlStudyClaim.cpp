@@ -161,8 +161,8 @@ private:
         const bool isSame = built.movedTo.isEmpty() && row.tagFile.digest == built.tagFile.digest;
         if (row.isBuilt && (isSame || built.isOnlyRearranged))
             return;
-        noteChange(mConnection, {kindOf(built, row, instances), mStudy.uid, built.movedFrom, built.movedTo,
-                                 instances});
+        noteChange(mConnection,
+                   {kindOf(built, row, instances), mStudy.uid, built.movedFrom, built.movedTo, instances});
     }
 
     static ChangeKind kindOf(const BuiltStudy& built, const SearchRowState& row, int instances)

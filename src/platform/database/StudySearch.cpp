@@ -159,7 +159,8 @@ Kdd::Result StudySearch::refresh(const FoundStudy& former, const BuiltStudy& pre
     isDone = false;
     return d->transact(Access::Write, [&] {
         const SearchRowState row = searchRowOf(d->connection, former.id);
-        const bool isAsRead = row.isBuilt == former.isBuilt && row.tagFile.fileSize == former.tagFile.fileSize &&
+        const bool isAsRead = row.isBuilt == former.isBuilt &&
+                              row.tagFile.fileSize == former.tagFile.fileSize &&
                               row.tagFile.modified == former.tagFile.modified;
         if (!isAsRead || present.search.series.empty())
             return;
@@ -171,8 +172,9 @@ Kdd::Result StudySearch::refresh(const FoundStudy& former, const BuiltStudy& pre
         int instances = 0;
         for (const SeriesSearchRecord& series : present.search.series)
             instances += series.instances;
-        noteChange(d->connection, {row.isBuilt ? ChangeKind::Corrected : ChangeKind::Arrived, former.uid, {}, {},
-                                   instances});
+        noteChange(
+            d->connection,
+            {row.isBuilt ? ChangeKind::Corrected : ChangeKind::Arrived, former.uid, {}, {}, instances});
     });
 }
 
@@ -196,8 +198,9 @@ Kdd::Result StudySearch::prepare()
         obtainWordsIndex(d->connection);
         QVector<qint64> studies;
         {
-            SqlRows rows = d->connection.ask("SELECT id FROM study WHERE NOT EXISTS (SELECT 1 FROM study_search"
-                                             " WHERE study_id = study.id)");
+            SqlRows rows =
+                d->connection.ask("SELECT id FROM study WHERE NOT EXISTS (SELECT 1 FROM study_search"
+                                  " WHERE study_id = study.id)");
             while (rows.next())
                 studies.push_back(rows.number(0));
         }

@@ -68,8 +68,8 @@ struct FoundStudy
 {
     int id = 0;
     QByteArray uid;
-    bool isBuilt = false;  ///< else it is what registration knows of it
-    TagFileStamp tagFile;  ///< that it was taken from, without the size of what counts
+    bool isBuilt = false;   ///< else it is what registration knows of it
+    TagFileStamp tagFile;   ///< that it was taken from, without the size of what counts
     QByteArray modalities;  ///< separated by "\"
     int series = 0;
     int instances = 0;

@@ -55,7 +55,8 @@ Outcome fillSearch(const GlobalOptions& options)
     else if (!options.quiet)
         std::printf("%d studies are known to searches now, %d failed\n", totals.studies, totals.failed);
     const QByteArray finished = QByteArray::number(totals.studies) + " studies are indexed";
-    return !toldOfInterrupt(finished.constData()) && isDone && totals.failed == 0 ? Outcome::Done : Outcome::Failed;
+    return !toldOfInterrupt(finished.constData()) && isDone && totals.failed == 0 ? Outcome::Done
+                                                                                  : Outcome::Failed;
 }
 
 Outcome runBuild(const GlobalOptions& options, const BuildRequest& request)

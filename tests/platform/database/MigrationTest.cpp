@@ -80,12 +80,11 @@ TEST_P(MigrationTest, ADatabaseOfTheSecondSchemaKnowsWhichFilesACorrectionMoved)
 {
     add({dicom("/d/a", "1", "1.1", "x"), dicom("/d/b", "1", "1.1", "")});
     correct({{"1", "x", "2", "2.1", "y", "changes"}, {"1", "/d/b", "2", "2.1", "/d/b", "changes"}});
-    for (const char* backwards : {"DROP TABLE change", "DROP TABLE series_request", "DROP TABLE series_search",
-                                  "DROP TABLE study_modality", "DROP TABLE IF EXISTS study_parts",
-                                  "DROP TABLE study_words", "DROP TABLE study_answer",
-                                  "DROP TABLE study_search", "DROP INDEX file_of_correction",
-                                  "ALTER TABLE file DROP COLUMN correction_id",
-          "UPDATE schema_version SET version = 2"})
+    for (const char* backwards :
+         {"DROP TABLE change", "DROP TABLE series_request", "DROP TABLE series_search",
+          "DROP TABLE study_modality", "DROP TABLE IF EXISTS study_parts", "DROP TABLE study_words",
+          "DROP TABLE study_answer", "DROP TABLE study_search", "DROP INDEX file_of_correction",
+          "ALTER TABLE file DROP COLUMN correction_id", "UPDATE schema_version SET version = 2"})
         execute(backwards);
     open();  // and bring it up to date
     correct({{"1", "x", "1", "1.1", "x", ""}, {"1", "/d/b", "1", "1.1", "/d/b", ""}});
@@ -99,10 +98,10 @@ TEST_P(MigrationTest, ADatabaseOfTheThirdSchemaIsFoundBySearchesOnceItIsPrepared
     file.patientName = "Müller^Eva";
     file.modality = "CT";
     add({file});
-    for (const char* backwards : {"DROP TABLE change", "DROP TABLE series_request", "DROP TABLE series_search",
-                                  "DROP TABLE study_modality", "DROP TABLE IF EXISTS study_parts",
-                                  "DROP TABLE study_words", "DROP TABLE study_answer",
-                                  "DROP TABLE study_search", "UPDATE schema_version SET version = 3"})
+    for (const char* backwards :
+         {"DROP TABLE change", "DROP TABLE series_request", "DROP TABLE series_search",
+          "DROP TABLE study_modality", "DROP TABLE IF EXISTS study_parts", "DROP TABLE study_words",
+          "DROP TABLE study_answer", "DROP TABLE study_search", "UPDATE schema_version SET version = 3"})
         execute(backwards);
     Kdd::Result result;
     const auto search = StudySearch::open(address(), result);

@@ -1,8 +1,8 @@
 #include "platform/database/SearchText.h"
 
-#include <gtest/gtest.h>
-
 #include <QRegularExpression>
+
+#include <gtest/gtest.h>
 
 using namespace Kxg;
 
@@ -15,7 +15,9 @@ bool matches(const QByteArray& text, const SearchPatterns& patterns)
     for (const QByteArray& pattern : patterns.patterns) {
         QString expression = QRegularExpression::escape(QString::fromLatin1(pattern));
         expression.replace(QLatin1String("\\*"), QLatin1String(".*"));
-        if (!QRegularExpression(QRegularExpression::anchoredPattern(expression)).match(QString::fromLatin1(text)).hasMatch())
+        if (!QRegularExpression(QRegularExpression::anchoredPattern(expression))
+                 .match(QString::fromLatin1(text))
+                 .hasMatch())
             return false;
     }
     return true;
@@ -96,11 +98,16 @@ struct WrittenTime
 };
 
 constexpr WrittenTime kTimes[] = {
-    {"10", "100000.000000", "105959.999999"},       {"1030", "103000.000000", "103059.999999"},
-    {"103015", "103015.000000", "103015.999999"},   {"103015.5", "103015.500000", "103015.599999"},
-    {"10:30:15", "103015.000000", "103015.999999"}, {"1", "", ""},
-    {"10301", "", ""},                              {"1030.5", "", ""},
-    {"103015.1234567", "", ""},                     {"ab", "", ""},
+    {"10", "100000.000000", "105959.999999"},
+    {"1030", "103000.000000", "103059.999999"},
+    {"103015", "103015.000000", "103015.999999"},
+    {"103015.5", "103015.500000", "103015.599999"},
+    {"10:30:15", "103015.000000", "103015.999999"},
+    {"1", "", ""},
+    {"10301", "", ""},
+    {"1030.5", "", ""},
+    {"103015.1234567", "", ""},
+    {"ab", "", ""},
     {"", "", ""},
 };
 

@@ -8,7 +8,8 @@ using namespace Kxg;
 namespace
 {
 
-StudySearchRecord aStudy(const char* name, const char* date, const char* id, std::vector<const char*> modalities)
+StudySearchRecord aStudy(const char* name, const char* date, const char* id,
+                         std::vector<const char*> modalities)
 {
     StudySearchRecord study;
     study.patientName = name;
@@ -63,7 +64,8 @@ class StudySearchTest : public DatabaseTest
 protected:
     void build(const char* uid, const StudySearchRecord& study, const char* digest = "d")
     {
-        add({dicom(QByteArray("/d/" + QByteArray(uid)).constData(), uid, QByteArray(uid + QByteArray(".1")), uid)});
+        add({dicom(QByteArray("/d/" + QByteArray(uid)).constData(), uid, QByteArray(uid + QByteArray(".1")),
+                   uid)});
         finish(uid, study, digest);
     }
 
@@ -115,8 +117,8 @@ protected:
         EXPECT_EQ(search().changes(after, 100, noted).text().toStdString(), "");
         QByteArray text;
         for (const StudyChangeNote& each : noted)
-            text += QByteArray::number(each.position) + "ACMD"[static_cast<int>(each.kind) - 1] + each.studyInstanceUID +
-                    ' ';
+            text += QByteArray::number(each.position) + "ACMD"[static_cast<int>(each.kind) - 1] +
+                    each.studyInstanceUID + ' ';
         return text.toStdString();
     }
 
@@ -124,7 +126,8 @@ private:
     std::unique_ptr<StudySearch> mSearch;
 };
 
-INSTANTIATE_TEST_SUITE_P(Engines, StudySearchTest, testing::Values(Engine::Sqlite, Engine::Postgres), engineName);
+INSTANTIATE_TEST_SUITE_P(Engines, StudySearchTest, testing::Values(Engine::Sqlite, Engine::Postgres),
+                         engineName);
 
 TEST_P(StudySearchTest, FindsByEachColumn)
 {
@@ -142,8 +145,9 @@ TEST_P(StudySearchTest, FindsByEachColumn)
     EXPECT_EQ(find({oneOf(SearchColumn::PatientID, {"p1"})}), "");
     EXPECT_EQ(find({oneOf(SearchColumn::ModalitiesInStudy, {"CT"})}), "1 3");
     EXPECT_EQ(find({oneOf(SearchColumn::ModalitiesInStudy, {"MR", "SR"})}), "2 1");
-    EXPECT_EQ(find({oneOf(SearchColumn::ModalitiesInStudy, {"CT"}), between(SearchColumn::StudyDate, "2024", "")}),
-              "1");
+    EXPECT_EQ(
+        find({oneOf(SearchColumn::ModalitiesInStudy, {"CT"}), between(SearchColumn::StudyDate, "2024", "")}),
+        "1");
     EXPECT_EQ(find({between(SearchColumn::StudyDate, "20240101", "20240228")}), "1");
     EXPECT_EQ(find({between(SearchColumn::StudyDate, "", "20240301")}), "2 1");
     EXPECT_EQ(find({oneOf(SearchColumn::StudyUID, {"3", "1", "9"})}), "1 3");
@@ -165,12 +169,13 @@ TEST_P(StudySearchTest, ARangeOfDatesAndTimesIsOneOfMoments)
 TEST_P(StudySearchTest, PagesFollowEachOtherInEveryOrder)
 {
     for (int i = 0; i < 9; ++i)
-        build(QByteArray::number(i).constData(),
-              aStudy(i % 2 ? "Same^Name" : "", i % 3 ? "20240101" : "", QByteArray::number(i % 4).constData(), {"CT"}));
-    const std::vector<SearchOrder> orders[] = {{},
-                                               {{SearchColumn::PatientName, false}},
-                                               {{SearchColumn::PatientName, true}},
-                                               {{SearchColumn::PatientID, false}, {SearchColumn::StudyDate, false}}};
+        build(QByteArray::number(i).constData(), aStudy(i % 2 ? "Same^Name" : "", i % 3 ? "20240101" : "",
+                                                        QByteArray::number(i % 4).constData(), {"CT"}));
+    const std::vector<SearchOrder> orders[] = {
+        {},
+        {{SearchColumn::PatientName, false}},
+        {{SearchColumn::PatientName, true}},
+        {{SearchColumn::PatientID, false}, {SearchColumn::StudyDate, false}}};
     for (const auto& order : orders) {
         const std::string all = find({}, order);
         EXPECT_EQ(all.size(), 17u);

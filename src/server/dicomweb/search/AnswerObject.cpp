@@ -69,8 +69,8 @@ QByteArray elementOf(const QByteArray& lines, const QByteArray& name)
 
 void AnswerObject::add(const QByteArray& name, const QByteArray& element)
 {
-    const bool isThere = std::any_of(mElements.begin(), mElements.end(),
-                                     [&](const auto& each) { return each.first == name; });
+    const bool isThere =
+        std::any_of(mElements.begin(), mElements.end(), [&](const auto& each) { return each.first == name; });
     if (!isThere)
         mElements.emplace_back(name, element);
 }

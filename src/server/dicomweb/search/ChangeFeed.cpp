@@ -46,8 +46,8 @@ bool takeNumber(const Http::Request& request, const char* name, qint64 greatest,
 QByteArray jsonOf(const Kxg::StudyChangeNote& change)
 {
     const QDateTime at = QDateTime::fromMSecsSinceEpoch(change.at, Qt::UTC);
-    QByteArray json = "{\"position\":" + QByteArray::number(change.position) + ",\"change\":\"" + nameOf(change.kind) +
-                      "\",\"study\":" + jsonText(change.studyInstanceUID) +
+    QByteArray json = "{\"position\":" + QByteArray::number(change.position) + ",\"change\":\"" +
+                      nameOf(change.kind) + "\",\"study\":" + jsonText(change.studyInstanceUID) +
                       ",\"instances\":" + QByteArray::number(change.instances) +
                       ",\"time\":" + jsonText(at.toString(Qt::ISODateWithMs).toLatin1());
     if (change.kind == Kxg::ChangeKind::Moved)
@@ -71,9 +71,8 @@ Http::Response ChangeFeed::answer(const Http::Request& request, const ResourcePa
         !takeNumber(request, "limit", kGreatestLimit, limit))
         return Http::failure(400, QStringLiteral("after and limit are whole numbers"));
     std::vector<Kxg::StudyChangeNote> changes;
-    const Result result = mDatabase.ask([&](Kxg::StudySearch& search) {
-        return search.changes(after, static_cast<int>(limit), changes);
-    });
+    const Result result = mDatabase.ask(
+        [&](Kxg::StudySearch& search) { return search.changes(after, static_cast<int>(limit), changes); });
     if (result.bad())
         return Http::failure(503, QStringLiteral("The image database cannot be asked now"));
     QByteArray body = "{\"changes\":[";

@@ -20,22 +20,23 @@ using Names = std::vector<std::pair<QByteArray, const char*>>;
 
 const Names& studyNames()
 {
-    static const Names kNames = {{"00080020", "DA"}, {"00080030", "TM"}, {"00080050", "SH"}, {"00080090", "PN"},
-                                 {"00081030", "LO"}, {"00100010", "PN"}, {"00100020", "LO"}, {"00100030", "DA"},
-                                 {"00100040", "CS"}, {"00200010", "SH"}};
+    static const Names kNames = {
+        {"00080020", "DA"}, {"00080030", "TM"}, {"00080050", "SH"}, {"00080090", "PN"}, {"00081030", "LO"},
+        {"00100010", "PN"}, {"00100020", "LO"}, {"00100030", "DA"}, {"00100040", "CS"}, {"00200010", "SH"}};
     return kNames;
 }
 
 const Names& seriesNames()
 {
-    static const Names kNames = {{"00080021", "DA"}, {"00080031", "TM"}, {"00080060", "CS"},
-                                 {"0008103E", "LO"}, {"00200011", "IS"}};
+    static const Names kNames = {
+        {"00080021", "DA"}, {"00080031", "TM"}, {"00080060", "CS"}, {"0008103E", "LO"}, {"00200011", "IS"}};
     return kNames;
 }
 
 const Names& patientNames()
 {
-    static const Names kNames = {{"00100010", "PN"}, {"00100020", "LO"}, {"00100030", "DA"}, {"00100040", "CS"}};
+    static const Names kNames = {
+        {"00100010", "PN"}, {"00100020", "LO"}, {"00100030", "DA"}, {"00100040", "CS"}};
     return kNames;
 }
 
@@ -44,9 +45,17 @@ const char* const kAlsoOfSeries[] = {"00080005", "00080201", "00400244", "004002
 const char* const kAlsoOfStudy[] = {"00080005", "00080201"};
 
 const DcmTagKey kImageKeys[] = {
-    DCM_SpecificCharacterSet, DCM_SOPClassUID,    DCM_SOPInstanceUID, DCM_TimezoneOffsetFromUTC,
-    DCM_StudyInstanceUID,     DCM_SeriesInstanceUID, DCM_InstanceNumber, DCM_NumberOfFrames,
-    DCM_Rows,                 DCM_Columns,        DCM_BitsAllocated,
+    DCM_SpecificCharacterSet,
+    DCM_SOPClassUID,
+    DCM_SOPInstanceUID,
+    DCM_TimezoneOffsetFromUTC,
+    DCM_StudyInstanceUID,
+    DCM_SeriesInstanceUID,
+    DCM_InstanceNumber,
+    DCM_NumberOfFrames,
+    DCM_Rows,
+    DCM_Columns,
+    DCM_BitsAllocated,
 };
 
 std::vector<QByteArray> wanted(const Names& names, const char* const* also, size_t numAlso,
@@ -148,7 +157,8 @@ void FoundAnswers::addStudy(AnswerObject& object, const Kxg::FoundStudy& study) 
     if (mRequest.showsAll)
         object.addAllLines(study.attributes);
     else
-        object.addLines(study.attributes, wanted(studyNames(), kAlsoOfStudy, std::size(kAlsoOfStudy), mFields));
+        object.addLines(study.attributes,
+                        wanted(studyNames(), kAlsoOfStudy, std::size(kAlsoOfStudy), mFields));
     object.addMissing(studyNames());
 }
 
@@ -160,7 +170,8 @@ void FoundAnswers::addSeries(AnswerObject& object, const Kxg::FoundSeries& serie
     if (mRequest.showsAll)
         object.addAllLines(series.attributes);
     else
-        object.addLines(series.attributes, wanted(seriesNames(), kAlsoOfSeries, std::size(kAlsoOfSeries), mFields));
+        object.addLines(series.attributes,
+                        wanted(seriesNames(), kAlsoOfSeries, std::size(kAlsoOfSeries), mFields));
     // Below a study the study's own attributes are shown where they are named.
     object.addLines(series.study.attributes, mFields);
     object.addMissing(seriesNames());
@@ -187,7 +198,8 @@ void FoundAnswers::add(const Kxg::FoundSeries& series)
 void FoundAnswers::add(const Kxg::FoundSeries& series, const TagMap& image)
 {
     AnswerObject object;
-    begin(object, addressOf(series.study) + "/series/" + series.uid + "/instances/" + image.uid(TagMap::ImageLevel));
+    begin(object,
+          addressOf(series.study) + "/series/" + series.uid + "/instances/" + image.uid(TagMap::ImageLevel));
     object.addObject(ownJson(image, mImageKeys, mRequest.showsAll));
     if (mRequest.series.isEmpty())
         addSeries(object, series);

@@ -64,7 +64,8 @@ bool matchesText(const QString& value, const QString& wanted, DcmEVR vr)
         return value == wanted.trimmed();
     // Codes are capital letters by definition.
     const bool isCode = vr == EVR_CS || vr == EVR_AE;
-    return isCode ? matchesStars(value, wanted) : matchesStars(Kxg::foldedText(value), Kxg::foldedText(wanted));
+    return isCode ? matchesStars(value, wanted)
+                  : matchesStars(Kxg::foldedText(value), Kxg::foldedText(wanted));
 }
 
 // ---- names
@@ -144,10 +145,12 @@ bool momentOf(QString text, bool isLast, std::optional<int> zone, QByteArray& mo
     if (filled.size() < 4 || filled.size() > kFirst.size())
         return false;
     filled += (isLast ? kLast : kFirst).mid(filled.size());
-    QDateTime at = QDateTime::fromString(QString::fromLatin1(filled.left(14)), QStringLiteral("yyyyMMddHHmmss"));
+    QDateTime at =
+        QDateTime::fromString(QString::fromLatin1(filled.left(14)), QStringLiteral("yyyyMMddHHmmss"));
     // The last day of a month is not always the 31st.
     if (!at.isValid() && isLast && text.trimmed().size() == 6) {
-        const QDate first = QDate::fromString(text.trimmed() + QStringLiteral("01"), QStringLiteral("yyyyMMdd"));
+        const QDate first =
+            QDate::fromString(text.trimmed() + QStringLiteral("01"), QStringLiteral("yyyyMMdd"));
         at = QDateTime(first.addMonths(1).addDays(-1), QTime(23, 59, 59));
     }
     if (!at.isValid())
@@ -169,7 +172,8 @@ bool matchesMoment(const QString& value, const QString& wanted, std::optional<in
         return false;
     if (momentOf(wanted, false, zone, from) && momentOf(wanted, true, zone, to))
         return at >= from && at <= to;
-    for (int dash = wanted.indexOf(QLatin1Char('-')); dash >= 0; dash = wanted.indexOf(QLatin1Char('-'), dash + 1)) {
+    for (int dash = wanted.indexOf(QLatin1Char('-')); dash >= 0;
+         dash = wanted.indexOf(QLatin1Char('-'), dash + 1)) {
         const QString first = wanted.left(dash).trimmed();
         const QString last = wanted.mid(dash + 1).trimmed();
         const bool isFrom = first.isEmpty() || momentOf(first, false, zone, from);
@@ -237,7 +241,8 @@ bool matchesOne(const QString& value, const QString& wanted, DcmEVR vr, std::opt
 
 bool holds(const SearchCondition& condition, const QStringList& values, std::optional<int> zone)
 {
-    const bool isEmpty = std::all_of(values.begin(), values.end(), [](const QString& each) { return each.isEmpty(); });
+    const bool isEmpty =
+        std::all_of(values.begin(), values.end(), [](const QString& each) { return each.isEmpty(); });
     if (condition.isEmpty)
         return isEmpty;
     if (isUniversal(condition))
@@ -266,7 +271,8 @@ Moment momentIn(const AttributeSource& source, const DcmTagKey& dateKey, const D
                      Kxg::searchTime(source.values({timeKey}).value(0).toLatin1())};
     if (!zone || moment.date.isEmpty() || moment.time.isEmpty())
         return moment;
-    const std::optional<int> own = zoneMinutes(source.values({DCM_TimezoneOffsetFromUTC}).value(0).toLatin1());
+    const std::optional<int> own =
+        zoneMinutes(source.values({DCM_TimezoneOffsetFromUTC}).value(0).toLatin1());
     if (!own)
         return moment;
     QDateTime at = QDateTime::fromString(QString::fromLatin1(moment.date + moment.time.left(6)),
@@ -283,8 +289,8 @@ bool isIn(const Moment& moment, const ValueRange& dates, const ValueRange& times
 {
     if (moment.date.isEmpty() || !isWithin(moment.date, dates))
         return false;
-    const bool isAfter = dates.from.isEmpty() || times.from.isEmpty() || moment.date > dates.from ||
-                         moment.time >= times.from;
+    const bool isAfter =
+        dates.from.isEmpty() || times.from.isEmpty() || moment.date > dates.from || moment.time >= times.from;
     const bool isBefore =
         dates.to.isEmpty() || times.to.isEmpty() || moment.date < dates.to || moment.time <= times.to;
     return isAfter && isBefore;
@@ -307,7 +313,8 @@ bool holdsMoment(const SearchCondition* date, const SearchCondition* time, const
         return false;
     if (date != nullptr && time != nullptr && dates.isRange && times.isRange)
         return isIn(moment, dates, times);
-    return (date == nullptr || isWithin(moment.date, dates)) && (time == nullptr || isWithin(moment.time, times));
+    return (date == nullptr || isWithin(moment.date, dates)) &&
+           (time == nullptr || isWithin(moment.time, times));
 }
 
 // ---- values
@@ -332,8 +339,8 @@ void collect(const QJsonObject& element, const QVector<DcmTagKey>& path, int dep
         if (depth + 1 == path.size())
             values.append(textOf(value).trimmed());
         else
-            collect(value.toObject().value(QLatin1String(keyName(path.at(depth + 1)))).toObject(), path, depth + 1,
-                    values);
+            collect(value.toObject().value(QLatin1String(keyName(path.at(depth + 1)))).toObject(), path,
+                    depth + 1, values);
     }
 }
 
@@ -399,7 +406,8 @@ bool isUniversal(const SearchCondition& condition)
     return std::any_of(condition.list.begin(), condition.list.end(), [&](const QString& value) {
         if (condition.vr == EVR_PN)
             return isUniversalName(value);
-        return takesWildcards(condition.vr) && !value.isEmpty() && value.count(QLatin1Char('*')) == value.size();
+        return takesWildcards(condition.vr) && !value.isEmpty() &&
+               value.count(QLatin1Char('*')) == value.size();
     });
 }
 
@@ -438,9 +446,10 @@ bool holdAll(const Conditions& conditions, const AttributeSource& source, std::o
             continue;
         if (!holdsMoment(date, time, momentIn(source, moment.first, moment.second, zone)))
             return false;
-        single.erase(std::remove_if(single.begin(), single.end(),
-                                    [&](const SearchCondition* each) { return each == date || each == time; }),
-                     single.end());
+        single.erase(
+            std::remove_if(single.begin(), single.end(),
+                           [&](const SearchCondition* each) { return each == date || each == time; }),
+            single.end());
     }
     return std::all_of(single.begin(), single.end(), [&](const SearchCondition* each) {
         return holds(*each, source.values(each->path), zone);

@@ -54,13 +54,15 @@ const IndexedAttribute kIndexedRequests[] = {
 const IndexedAttribute* findIndexed(const SearchCondition& condition)
 {
     const auto find = [&](const auto& table) -> const IndexedAttribute* {
-        const auto* found = std::find_if(std::begin(table), std::end(table),
-                                         [&](const IndexedAttribute& each) { return each.key == condition.key(); });
+        const auto* found =
+            std::find_if(std::begin(table), std::end(table),
+                         [&](const IndexedAttribute& each) { return each.key == condition.key(); });
         return found == std::end(table) ? nullptr : found;
     };
     if (!condition.isInItems())
         return find(kIndexed);
-    const bool isRequest = condition.path.size() == 2 && condition.path.front() == DCM_RequestAttributesSequence;
+    const bool isRequest =
+        condition.path.size() == 2 && condition.path.front() == DCM_RequestAttributesSequence;
     return isRequest ? find(kIndexedRequests) : nullptr;
 }
 
@@ -142,7 +144,7 @@ private:
             if (!condition.isEmpty && !parseRange(condition.vr, value, range)) {
                 mReason = QStringLiteral("\"%1\" is no %2, and no range of them")
                               .arg(value.left(40), condition.vr == EVR_DA ? QStringLiteral("date YYYYMMDD")
-                                                                         : QStringLiteral("time HHMMSS"));
+                                                                          : QStringLiteral("time HHMMSS"));
                 return false;
             }
         }
@@ -219,10 +221,10 @@ private:
 
     const SearchCondition* findOther(const DcmTagKey& key) const
     {
-        const auto found = std::find_if(mRequest.conditions.begin(), mRequest.conditions.end(),
-                                        [&](const SearchCondition& each) {
-                                            return each.path.size() == 1 && each.key() == key && !each.isEmpty;
-                                        });
+        const auto found = std::find_if(
+            mRequest.conditions.begin(), mRequest.conditions.end(), [&](const SearchCondition& each) {
+                return each.path.size() == 1 && each.key() == key && !each.isEmpty;
+            });
         return found == mRequest.conditions.end() ? nullptr : &*found;
     }
 

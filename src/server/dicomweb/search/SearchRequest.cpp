@@ -3,8 +3,8 @@
 #include <QHash>
 
 #include <dcmtk/dcmdata/dcdeftag.h>
-#include <dcmtk/dcmdata/dcdict.h>
 #include <dcmtk/dcmdata/dcdicent.h>
+#include <dcmtk/dcmdata/dcdict.h>
 #include <dcmtk/dcmdata/dctag.h>
 
 #include <algorithm>
@@ -55,7 +55,8 @@ const KnownOrder kOrders[] = {
 bool isHex(const QByteArray& text)
 {
     return text.size() == 8 && std::all_of(text.begin(), text.end(), [](char each) {
-               return (each >= '0' && each <= '9') || (each >= 'a' && each <= 'f') || (each >= 'A' && each <= 'F');
+               return (each >= '0' && each <= '9') || (each >= 'a' && each <= 'f') ||
+                      (each >= 'A' && each <= 'F');
            });
 }
 
@@ -107,7 +108,8 @@ public:
             if (!takeSwitch(field))
                 return false;
         }
-        return std::all_of(query.begin(), query.end(), [this](const Http::Field& field) { return take(field); });
+        return std::all_of(query.begin(), query.end(),
+                           [this](const Http::Field& field) { return take(field); });
     }
 
 private:
@@ -138,10 +140,12 @@ private:
             return fail(QStringLiteral("The value of %1 is too long").arg(quoted(name)));
         const bool isForeign = std::any_of(std::begin(kForeign), std::end(kForeign),
                                            [&](const char* each) { return name == each; });
-        if (isForeign || name == "fuzzymatching" || name == "emptyvaluematching" || name == "multiplevaluematching")
+        if (isForeign || name == "fuzzymatching" || name == "emptyvaluematching" ||
+            name == "multiplevaluematching")
             return true;
         if (name == "limit")
-            return parseNumber(field.value, mGreatest, mRequest.limit) || fail(QStringLiteral("limit is no number"));
+            return parseNumber(field.value, mGreatest, mRequest.limit) ||
+                   fail(QStringLiteral("limit is no number"));
         if (name == "offset")
             return parseNumber(field.value, kGreatestOffset, mRequest.offset) ||
                    fail(QStringLiteral("offset is no number"));
@@ -221,7 +225,8 @@ private:
         if (condition.key() == DCM_SpecificCharacterSet || field.value.isEmpty())
             return true;
         if (condition.vr == EVR_SQ)
-            return fail(QStringLiteral("%1 is a sequence: name an attribute of its items").arg(quoted(field.name)));
+            return fail(
+                QStringLiteral("%1 is a sequence: name an attribute of its items").arg(quoted(field.name)));
         condition.value = QString::fromUtf8(field.value);
         condition.isEmpty = mFindsEmpty && condition.value == QLatin1String("\"\"");
         takeList(condition);
@@ -309,8 +314,8 @@ std::optional<int> zoneMinutes(const QByteArray& offset)
     bool isNumber = false;
     const int number = text.mid(1).toInt(&isNumber);
     const bool isSigned = text.startsWith('+') || text.startsWith('-');
-    if (text.size() != 5 || !isSigned || !isNumber || text.at(1) == '-' || text.at(1) == '+' || number % 100 >= 60 ||
-        number > 1400)
+    if (text.size() != 5 || !isSigned || !isNumber || text.at(1) == '-' || text.at(1) == '+' ||
+        number % 100 >= 60 || number > 1400)
         return {};
     const int minutes = number / 100 * 60 + number % 100;
     return text.startsWith('-') ? -minutes : minutes;

@@ -29,7 +29,8 @@ struct SearchCondition
     DcmEVR vr = EVR_UNKNOWN;  ///< that the dictionary has
     QString value;            ///< as it was sent; never empty
     bool isEmpty = false;     ///< what has no value is asked for
-    QVector<QString> list;    ///< the values of a list, any of which is wanted; of one that is none the value itself
+    QVector<QString>
+        list;  ///< the values of a list, any of which is wanted; of one that is none the value itself
 
     const DcmTagKey& key() const { return path.last(); }
     bool isInItems() const { return path.size() > 1; }

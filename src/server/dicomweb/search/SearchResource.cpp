@@ -10,7 +10,8 @@ namespace
 
 const QVector<Http::MediaType> kOffers = {{"application/dicom+json", ""}, {"application/json", ""}};
 
-void addWarnings(const SearchRequest& request, const SearchRun& run, const QByteArray& root, Http::Response& response)
+void addWarnings(const SearchRequest& request, const SearchRun& run, const QByteArray& root,
+                 Http::Response& response)
 {
     const QByteArray begin = "299 " + root + ": ";
     if (run.remaining() > 0)
@@ -18,8 +19,9 @@ void addWarnings(const SearchRequest& request, const SearchRun& run, const QByte
                                           QByteArray::number(run.remaining()) +
                                           " additional results that can be requested");
     if (request.isFuzzy)
-        response.addHeader("Warning", begin + "The fuzzymatching parameter is not supported. Only literal matching has"
-                                              " been performed.");
+        response.addHeader("Warning",
+                           begin + "The fuzzymatching parameter is not supported. Only literal matching has"
+                                   " been performed.");
 }
 
 }  // namespace

@@ -94,7 +94,8 @@ std::vector<const TagMap*> imagesOf(const TagMap& series)
 Result SearchRun::run(FoundAnswers& answers)
 {
     if (!mPlan.isExact() && !mPlan.isNarrowed) {
-        mTooBroad = QStringLiteral("No index helps to find this: ask also for a name, date, identifier or UID");
+        mTooBroad =
+            QStringLiteral("No index helps to find this: ask also for a name, date, identifier or UID");
         return {};
     }
     switch (mRequest.level) {
@@ -191,7 +192,8 @@ Result SearchRun::runListed(FoundAnswers& answers, const Find& find, const Count
     int matched = 0;
     Result result = count(query, most + 1, candidates);
     if (candidates > most) {
-        mTooBroad = QStringLiteral("More than %1 studies or series would have to be looked through: narrow the search")
+        mTooBroad = QStringLiteral(
+                        "More than %1 studies or series would have to be looked through: narrow the search")
                         .arg(most);
         return result;
     }
@@ -214,7 +216,9 @@ Result SearchRun::runStudies(FoundAnswers& answers)
 {
     return runListed<Kxg::FoundStudy>(
         answers, [this](const auto& query, auto& found) { return findStudies(query, found); },
-        [this](const auto& query, int most, int& number) { return mSearch.countStudies(query, most, number); },
+        [this](const auto& query, int most, int& number) {
+            return mSearch.countStudies(query, most, number);
+        },
         [this](const Kxg::FoundStudy& study) { return holds(study) && holdsImage(study.uid, {}); });
 }
 
@@ -223,7 +227,9 @@ Result SearchRun::runSeries(FoundAnswers& answers)
     return runListed<Kxg::FoundSeries>(
         answers, [this](const auto& query, auto& found) { return findSeries(query, found); },
         [this](const auto& query, int most, int& number) { return mSearch.countSeries(query, most, number); },
-        [this](const Kxg::FoundSeries& series) { return holds(series) && holdsImage(series.study.uid, series.uid); });
+        [this](const Kxg::FoundSeries& series) {
+            return holds(series) && holdsImage(series.study.uid, series.uid);
+        });
 }
 
 Result SearchRun::runPatients(FoundAnswers& answers)
@@ -279,7 +285,8 @@ bool SearchRun::takeImages(const std::vector<Kxg::FoundSeries>& page, int& skipp
         // Where every image holds, their number is known without looking.
         const bool isPassed = mPlan.onImages.empty() && (series.instances <= skipped || wanted <= 0);
         const int before = answers.count();
-        const int matched = isPassed ? series.instances : addImages(series, skipped, std::max(0, wanted), answers);
+        const int matched =
+            isPassed ? series.instances : addImages(series, skipped, std::max(0, wanted), answers);
         const int passed = std::min(skipped, matched);
         skipped -= passed;
         mRemaining += matched - passed - (answers.count() - before);
@@ -295,8 +302,10 @@ Result SearchRun::runImages(FoundAnswers& answers)
     int candidates = 0;
     Result result = opensAll ? mSearch.countSeries(mPlan.query, kMaxTagFiles + 1, candidates) : Result();
     if (candidates > kMaxTagFiles) {
-        mTooBroad = QStringLiteral("The images of more than %1 series would have to be looked through: narrow the search")
-                        .arg(kMaxTagFiles);
+        mTooBroad =
+            QStringLiteral(
+                "The images of more than %1 series would have to be looked through: narrow the search")
+                .arg(kMaxTagFiles);
         return result;
     }
     int skipped = mRequest.offset;

@@ -12,7 +12,8 @@ class SearchRun
 {
 public:
     /// All of them must outlive the object.
-    SearchRun(const SearchRequest& request, const SearchPlan& plan, Kxg::StudySearch& search, StudyShelf& shelf)
+    SearchRun(const SearchRequest& request, const SearchPlan& plan, Kxg::StudySearch& search,
+              StudyShelf& shelf)
         : mRequest(request)
         , mPlan(plan)
         , mSearch(search)

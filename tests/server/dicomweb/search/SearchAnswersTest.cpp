@@ -30,15 +30,24 @@ protected:
                            .with(DCM_BodyPartExamined, "HEAD")
                            .with(DCM_InstanceNumber, QByteArray(sop).right(1).constData())
                            .withItem(DCM_RequestAttributesSequence,
-                                     anItem().with(DCM_ScheduledProcedureStepID, "STEP1").with(DCM_RequestedProcedureID, "RP1"))
-                           .withItem(DCM_RequestAttributesSequence, anItem().with(DCM_ScheduledProcedureStepID, "STEP2")));
-        store("1.1.2.1", image("1.1.2.1", "1.1", "1.1.2").with(DCM_PatientName, "Muller^Eva").with(DCM_Modality, "SR").with(DCM_SeriesNumber, "1"));
-        store("z.2.1.1", image("2.1.1", "2", "2.1").without(DCM_Modality).without(DCM_PatientName).without(DCM_StudyDate));
+                                     anItem()
+                                         .with(DCM_ScheduledProcedureStepID, "STEP1")
+                                         .with(DCM_RequestedProcedureID, "RP1"))
+                           .withItem(DCM_RequestAttributesSequence,
+                                     anItem().with(DCM_ScheduledProcedureStepID, "STEP2")));
+        store("1.1.2.1", image("1.1.2.1", "1.1", "1.1.2")
+                             .with(DCM_PatientName, "Muller^Eva")
+                             .with(DCM_Modality, "SR")
+                             .with(DCM_SeriesNumber, "1"));
+        store(
+            "z.2.1.1",
+            image("2.1.1", "2", "2.1").without(DCM_Modality).without(DCM_PatientName).without(DCM_StudyDate));
         add();
     }
 };
 
-INSTANTIATE_TEST_SUITE_P(Engines, SearchAnswers, testing::Values(Engine::Sqlite, Engine::Postgres), engineName);
+INSTANTIATE_TEST_SUITE_P(Engines, SearchAnswers, testing::Values(Engine::Sqlite, Engine::Postgres),
+                         engineName);
 
 TEST_P(SearchAnswers, HaveWhatViewersNeed)
 {
@@ -46,11 +55,13 @@ TEST_P(SearchAnswers, HaveWhatViewersNeed)
     const QJsonArray studies = list("studies");
     ASSERT_EQ(studies.size(), 2);
     const QJsonObject study = studies.at(0).toObject();
-    for (const char* key : {"00080020", "00080030", "00080050", "00080061", "00080090", "00081030", "00081190", "00080056",
-                            "00080201", "00100010", "00100020", "00100030", "00100040", "0020000D", "00200010", "00201206", "00201208"})
+    for (const char* key : {"00080020", "00080030", "00080050", "00080061", "00080090", "00081030",
+                            "00081190", "00080056", "00080201", "00100010", "00100020", "00100030",
+                            "00100040", "0020000D", "00200010", "00201206", "00201208"})
         EXPECT_TRUE(study.contains(QLatin1String(key))) << key;
     EXPECT_EQ(textOf(study, "00100010"), QStringLiteral("Müller^Eva"));
-    EXPECT_EQ(study.value(QLatin1String("00080061")).toObject().value(QLatin1String("Value")).toArray().size(), 2);
+    EXPECT_EQ(
+        study.value(QLatin1String("00080061")).toObject().value(QLatin1String("Value")).toArray().size(), 2);
     EXPECT_EQ(textOf(study, "00201206"), QLatin1String("2"));
     EXPECT_EQ(textOf(study, "00201208"), QLatin1String("4"));
     EXPECT_EQ(textOf(study, "00081190"), QLatin1String("http://host/dicom-web/studies/1.1"));
@@ -65,7 +76,8 @@ TEST_P(SearchAnswers, GoDownTheLevels)
     storeTwoStudies();
     EXPECT_EQ(values("studies/1.1/series", "0020000E"), "1.1.2 1.1.1");  // by number
     EXPECT_EQ(values("studies/1.1/series", "00201209"), "1 3");
-    EXPECT_EQ(values("studies/1.1/series?Modality=CT", "00081190"), "http://host/dicom-web/studies/1.1/series/1.1.1");
+    EXPECT_EQ(values("studies/1.1/series?Modality=CT", "00081190"),
+              "http://host/dicom-web/studies/1.1/series/1.1.1");
     EXPECT_FALSE(list("studies/1.1/series").at(0).toObject().contains(QLatin1String("00100010")));
     EXPECT_EQ(values("series?Modality=CT", "00100020"), "P1");
     EXPECT_EQ(values("studies/1.1/series/1.1.1/instances", "00080018"), "1.1.1.1 1.1.1.2 1.1.1.3");
@@ -131,7 +143,9 @@ TEST_P(SearchAnswers, FindWhatIsAskedFor)
 TEST_P(SearchAnswers, ShowTheFieldsThatAreNamed)
 {
     storeTwoStudies();
-    EXPECT_EQ(values("studies?StudyInstanceUID=1.1&includefield=00080201%2C00081030&includefield=PatientID", "00080201"), "+0100");
+    EXPECT_EQ(values("studies?StudyInstanceUID=1.1&includefield=00080201%2C00081030&includefield=PatientID",
+                     "00080201"),
+              "+0100");
     EXPECT_EQ(values("studies/1.1/series?Modality=CT&includefield=BodyPartExamined", "00180015"), "HEAD");
     EXPECT_EQ(values("studies/1.1/series?Modality=CT&includefield=all", "00180015"), "HEAD");
     EXPECT_EQ(values("studies/1.1/series/1.1.1/instances?limit=1&includefield=00180015", "00180015"), "HEAD");

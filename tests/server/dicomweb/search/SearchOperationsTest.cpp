@@ -27,7 +27,11 @@ protected:
     void storeImage(const char* sop, const char* study, const char* name) const
     {
         const QByteArray series = study + QByteArray(".9");
-        store(sop, anImage(sop).inStudy(study).inSeries(series.constData()).with(DCM_PatientName, name).with(DCM_Modality, "CT"));
+        store(sop, anImage(sop)
+                       .inStudy(study)
+                       .inSeries(series.constData())
+                       .with(DCM_PatientName, name)
+                       .with(DCM_Modality, "CT"));
     }
 
     /// UID, name and number of images of each study.
@@ -35,8 +39,9 @@ protected:
     {
         std::string text;
         for (const QJsonValue& each : list("studies?orderby=StudyInstanceUID"))
-            text += (textOf(each.toObject(), "0020000D") + QLatin1Char(' ') + textOf(each.toObject(), "00100010") +
-                     QLatin1Char(' ') + textOf(each.toObject(), "00201208") + QLatin1String("; "))
+            text += (textOf(each.toObject(), "0020000D") + QLatin1Char(' ') +
+                     textOf(each.toObject(), "00100010") + QLatin1Char(' ') +
+                     textOf(each.toObject(), "00201208") + QLatin1String("; "))
                         .toStdString();
         return text;
     }
@@ -55,12 +60,14 @@ protected:
     }
 
     /// Gives an attribute of an image a new value; with `oldStudy` the image comes from there.
-    void correct(const char* study, const char* image, const char* oldStudy, const char* key, const char* value)
+    void correct(const char* study, const char* image, const char* oldStudy, const char* key,
+                 const char* value)
     {
         QFile job(path("job.xml"));
         ASSERT_TRUE(job.open(QIODevice::WriteOnly));
-        job.write("<Job><Timestamp>20240131120000</Timestamp><Substitutions OldSUID='" + QByteArray(oldStudy) +
-                  "'><Tag " + key + "><Value>" + value + "</Value></Tag></Substitutions></Job>");
+        job.write("<Job><Timestamp>20240131120000</Timestamp><Substitutions OldSUID='" +
+                  QByteArray(oldStudy) + "'><Tag " + key + "><Value>" + value +
+                  "</Value></Tag></Substitutions></Job>");
         job.close();
         kdd({QStringLiteral("qa"), path("job.xml"), QStringLiteral("--study"), QString::fromLatin1(study),
              QStringLiteral("--image"), QString::fromLatin1(image)});
@@ -71,7 +78,8 @@ protected:
     int mLast = 0;
 };
 
-INSTANTIATE_TEST_SUITE_P(Engines, SearchOperations, testing::Values(Engine::Sqlite, Engine::Postgres), engineName);
+INSTANTIATE_TEST_SUITE_P(Engines, SearchOperations, testing::Values(Engine::Sqlite, Engine::Postgres),
+                         engineName);
 
 TEST_P(SearchOperations, ArrivalsAndRemovals)
 {

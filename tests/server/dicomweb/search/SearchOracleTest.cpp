@@ -73,7 +73,8 @@ private:
     static QString folded(const QString& text)
     {
         QString plain = text.normalized(QString::NormalizationForm_KD);
-        plain.remove(QRegularExpression(QStringLiteral("\\p{Mn}"), QRegularExpression::UseUnicodePropertiesOption));
+        plain.remove(
+            QRegularExpression(QStringLiteral("\\p{Mn}"), QRegularExpression::UseUnicodePropertiesOption));
         return plain.toCaseFolded().normalized(QString::NormalizationForm_C).trimmed();
     }
 
@@ -121,7 +122,8 @@ private:
                 components << folded(each);
             while (query.contains(QLatin1Char('^')) && components.size() < 5)
                 components << QString();
-            if (!group.trimmed().isEmpty() && fits(components.join(QLatin1Char('^')), parts + QLatin1String("(\\^.*)?")))
+            if (!group.trimmed().isEmpty() &&
+                fits(components.join(QLatin1Char('^')), parts + QLatin1String("(\\^.*)?")))
                 return true;
         }
         return false;
@@ -142,7 +144,9 @@ private:
             day.remove(QLatin1Char('.'));
             if (day.size() != 8)
                 return false;
-            return dash < 0 ? day == query : day >= query.left(dash) && (dash == query.size() - 1 || day <= query.mid(dash + 1));
+            return dash < 0
+                       ? day == query
+                       : day >= query.left(dash) && (dash == query.size() - 1 || day <= query.mid(dash + 1));
         }
         if (query.contains(QLatin1Char('*')) || query.contains(QLatin1Char('?')))
             return fits(folded(value), expression(folded(query), "."));
@@ -153,22 +157,24 @@ private:
     QMap<QString, QSet<QString>> mModalities;
 };
 
-const std::vector<DcmTagKey> Oracle::kKeys = {DCM_PatientName,     DCM_PatientID,        DCM_StudyDate,
-                                              DCM_AccessionNumber, DCM_StudyDescription, DCM_StudyID,
-                                              DCM_PatientBirthDate, DCM_ReferringPhysicianName};
+const std::vector<DcmTagKey> Oracle::kKeys = {
+    DCM_PatientName,      DCM_PatientID, DCM_StudyDate,        DCM_AccessionNumber,
+    DCM_StudyDescription, DCM_StudyID,   DCM_PatientBirthDate, DCM_ReferringPhysicianName};
 
 class SearchOracle : public SearchedArchive
 {
 };
 
-INSTANTIATE_TEST_SUITE_P(Engines, SearchOracle, testing::Values(Engine::Sqlite, Engine::Postgres), engineName);
+INSTANTIATE_TEST_SUITE_P(Engines, SearchOracle, testing::Values(Engine::Sqlite, Engine::Postgres),
+                         engineName);
 
 /// A value of the archive, or a piece of one with wildcards.
 QString question(const QString& value, bool isDate, std::mt19937& random)
 {
     if (isDate) {
         const QString day = value.isEmpty() ? QStringLiteral("20000101") : value;
-        const QString forms[] = {day, day + QLatin1Char('-'), QLatin1Char('-') + day, QStringLiteral("19900101-") + day};
+        const QString forms[] = {day, day + QLatin1Char('-'), QLatin1Char('-') + day,
+                                 QStringLiteral("19900101-") + day};
         return forms[random() % 4];
     }
     QString text = value;
@@ -187,7 +193,8 @@ QString question(const QString& value, bool isDate, std::mt19937& random)
     case 2:
         return QLatin1Char('*') + piece.toUpper();
     case 3:
-        return QLatin1Char('*') + piece.left(length / 2) + QLatin1Char('?') + piece.mid(length / 2 + 1) + QLatin1Char('*');
+        return QLatin1Char('*') + piece.left(length / 2) + QLatin1Char('?') + piece.mid(length / 2 + 1) +
+               QLatin1Char('*');
     default:
         return piece;
     }
@@ -203,13 +210,17 @@ TEST_P(SearchOracle, AgreesOnRandomQuestionsOverRealFiles)
         taken << realFiles(folder);
     taken.sort();
     for (const QString& file : qAsConst(taken)) {
-        const QString copy = path("images") + QLatin1Char('/') + QFileInfo(file).path().section(QLatin1Char('/'), -2).replace(QLatin1Char('/'), QLatin1Char('_'));
+        const QString copy =
+            path("images") + QLatin1Char('/') +
+            QFileInfo(file).path().section(QLatin1Char('/'), -2).replace(QLatin1Char('/'), QLatin1Char('_'));
         QDir().mkpath(copy);
         ASSERT_TRUE(QFile::copy(file, copy + QLatin1Char('/') + QFileInfo(file).fileName()));
-        }
+    }
     QProcess tool;
-    tool.start(QStringLiteral(KDD_BINARY), {QStringLiteral("--store"), path("store"), QStringLiteral("--database"),
-                                            QString::fromUtf8(address()), QStringLiteral("--quiet"), QStringLiteral("add"), path("images")});
+    tool.start(QStringLiteral(KDD_BINARY),
+               {QStringLiteral("--store"), path("store"), QStringLiteral("--database"),
+                QString::fromUtf8(address()), QStringLiteral("--quiet"), QStringLiteral("add"),
+                path("images")});
     ASSERT_TRUE(tool.waitForFinished(120000));  // what is no DICOM file there makes it end with 1
     // Only what was taken in, from the files that are shown.
     QMap<QString, QString> shown;
@@ -236,10 +247,13 @@ TEST_P(SearchOracle, AgreesOnRandomQuestionsOverRealFiles)
         const QString value = oracle.valueOf(static_cast<int>(random() % 1000), key);
         const QString query = key == DCM_ModalitiesInStudy ? value : question(value, isDate, random);
         // Wildcards alone are no question that an index answers.
-        if (query.trimmed() != query || !query.contains(QRegularExpression(QStringLiteral("[^*?^=]"))) || (isDate && QRegularExpression(QStringLiteral("[^0-9-]")).match(query).hasMatch()))
+        if (query.trimmed() != query || !query.contains(QRegularExpression(QStringLiteral("[^*?^=]"))) ||
+            (isDate && QRegularExpression(QStringLiteral("[^0-9-]")).match(query).hasMatch()))
             continue;
-        const QByteArray target = QByteArray("studies?limit=1000&") + QByteArray::number((quint32(key.getGroup()) << 16) | key.getElement(), 16).rightJustified(8, '0') + '=' +
-                                  query.toUtf8().toPercentEncoding();
+        const QByteArray target = QByteArray("studies?limit=1000&") +
+                                  QByteArray::number((quint32(key.getGroup()) << 16) | key.getElement(), 16)
+                                      .rightJustified(8, '0') +
+                                  '=' + query.toUtf8().toPercentEncoding();
         QStringList studies;
         for (const QJsonValue& each : list(target.constData()))
             studies << textOf(each.toObject(), "0020000D");

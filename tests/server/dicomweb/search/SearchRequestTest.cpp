@@ -24,7 +24,8 @@ std::string refusal(const char* query)
     SearchRequest request;
     SearchPlan plan;
     QString reason;
-    const bool isGood = SearchRequest::parse(fields(query), request, reason) && SearchPlan::make(request, plan, reason);
+    const bool isGood =
+        SearchRequest::parse(fields(query), request, reason) && SearchPlan::make(request, plan, reason);
     EXPECT_EQ(isGood, reason.isEmpty()) << query;
     return reason.toStdString();
 }
@@ -49,11 +50,24 @@ const char* const kUnderstood[] = {
 };
 
 const char* const kRefused[] = {
-    "PatientNmae=a",          "limit=-1",         "limit=ten",           "offset=1.5",
-    "fuzzymatching=yes",      "includefield=nix", "orderby=StudyFoo",    "orderby=Rows",
-    "timezone=0100",          "timezone=+01:00",  "StudyDate=yesterday", "StudyDate=20240101-2024",
-    "StudyDate=-",            "StudyTime=1",      "RequestAttributesSequence=1",
-    "A.B.C.D.E.F.G.H.I=1",    "=1",               ".PatientName=1",
+    "PatientNmae=a",
+    "limit=-1",
+    "limit=ten",
+    "offset=1.5",
+    "fuzzymatching=yes",
+    "includefield=nix",
+    "orderby=StudyFoo",
+    "orderby=Rows",
+    "timezone=0100",
+    "timezone=+01:00",
+    "StudyDate=yesterday",
+    "StudyDate=20240101-2024",
+    "StudyDate=-",
+    "StudyTime=1",
+    "RequestAttributesSequence=1",
+    "A.B.C.D.E.F.G.H.I=1",
+    "=1",
+    ".PatientName=1",
 };
 
 TEST(SearchRequest, IsUnderstoodOrRefusedWithAReason)
@@ -85,8 +99,8 @@ TEST(SearchRequest, ListsAreSeparatedByCommaOrBackslash)
 {
     SearchRequest request;
     QString reason;
-    ASSERT_TRUE(SearchRequest::parse(fields("StudyInstanceUID=1.2,1.3\\1.2&ModalitiesInStudy=CT,MR&PatientID=A\\B"),
-                                     request, reason));
+    ASSERT_TRUE(SearchRequest::parse(
+        fields("StudyInstanceUID=1.2,1.3\\1.2&ModalitiesInStudy=CT,MR&PatientID=A\\B"), request, reason));
     EXPECT_EQ(request.conditions[0].list, (QVector<QString>{QStringLiteral("1.2"), QStringLiteral("1.3")}));
     EXPECT_EQ(request.conditions[1].list.size(), 2);
     EXPECT_EQ(request.conditions[2].list.size(), 1);

@@ -33,7 +33,8 @@ class SearchedArchive : public testing::TestWithParam<Engine>
 protected:
     void SetUp() override
     {
-        mAddress = GetParam() == Engine::Sqlite ? "sqlite:" + path("kdd.sqlite").toUtf8() : newPostgresDatabase();
+        mAddress =
+            GetParam() == Engine::Sqlite ? "sqlite:" + path("kdd.sqlite").toUtf8() : newPostgresDatabase();
         mDatabase = std::make_unique<ThreadSearch>(mAddress);
         TagFile::setMetaFolder(path("store/meta").toLocal8Bit().constData());
         QDir().mkpath(path("images"));
@@ -79,7 +80,7 @@ protected:
                                       QByteArray::fromPercentEncoding(field.mid(equals + 1))});
         }
         ResourcePath resource;
-        EXPECT_TRUE(ResourcePath::parse(request.path.mid(1), resource));
+        EXPECT_TRUE(ResourcePath::parse(request.path, resource));
         SearchResource search(*mDatabase, mShelf);
         ChangeFeed feed(*mDatabase);
         return search.owns(resource) ? search.answer(request, resource) : feed.answer(request, resource);
@@ -117,7 +118,10 @@ protected:
                                 : value.toVariant().toString();
     }
 
-    std::string studies(const char* query) { return values((QByteArray("studies?") + query).constData(), "0020000D"); }
+    std::string studies(const char* query)
+    {
+        return values((QByteArray("studies?") + query).constData(), "0020000D");
+    }
 
     const QByteArray& address() const { return mAddress; }
     StudyShelf& shelf() { return mShelf; }
