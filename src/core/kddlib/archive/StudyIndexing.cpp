@@ -33,7 +33,8 @@ bool StudyIndexing::isCurrent(const Kxg::FoundStudy& study)
 {
     FileStatus status;
     return !statusOfTagFile(study.uid, status) || status.size == 0 ||
-           (study.isBuilt && status.size == study.tagFile.fileSize && status.modified == study.tagFile.modified);
+           (study.isBuilt && status.size == study.tagFile.fileSize &&
+            status.modified == study.tagFile.modified);
 }
 
 bool StudyIndexing::isStudyAttribute(const DcmTagKey& key)
