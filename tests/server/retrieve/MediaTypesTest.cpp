@@ -13,7 +13,8 @@ TEST(MediaTypes, AreToldOfEverySyntaxByItsOwnName)
     for (const SyntaxMedia& row : syntaxMedia()) {
         const Http::AcceptHeader byName(QByteArray("multipart/related; type=\"") + row.mediaType +
                                         "\"; transfer-syntax=" + row.uid);
-        const Http::AcceptHeader byAny("multipart/related; type=\"application/octet-stream\"; transfer-syntax=\"*\"");
+        const Http::AcceptHeader byAny(
+            "multipart/related; type=\"application/octet-stream\"; transfer-syntax=\"*\"");
         for (const Http::AcceptHeader& accept : {byName, byAny}) {
             PixelForm form;
             ASSERT_TRUE(choosePixelForm(accept, {row.uid, true, true, false}, form)) << row.uid;
@@ -48,7 +49,8 @@ const Row kRows[] = {
     {"multipart/related; type=application/octet-stream; transfer-syntax=1.2.840.10008.1.2.1", kJls,
      "D application/octet-stream"},
     {"multipart/related; type=application/octet-stream; transfer-syntax=*", kJls, "image/jls"},
-    {"multipart/related; type=application/octet-stream; transfer-syntax=1.2.840.10008.1.2.4.80", kJls, "image/jls"},
+    {"multipart/related; type=application/octet-stream; transfer-syntax=1.2.840.10008.1.2.4.80", kJls,
+     "image/jls"},
     {"multipart/related; type=application/octet-stream; transfer-syntax=1.2.840.10008.1.2.4.90", kJls, ""},
     {"multipart/related; type=application/octet-stream", kVideo, ""},
     {"multipart/related; type=video/mp4", kVideo, "video/mp4"},
@@ -58,7 +60,8 @@ const Row kRows[] = {
     {"multipart/related; type=image/jpeg; transfer-syntax=1.2.840.10008.1.2.4.70", kJpeg, ""},
     {"multipart/related; type=image/jp2, multipart/related; type=application/octet-stream", kJls,
      "D application/octet-stream"},
-    {"multipart/related; type=image/jls;q=0.1, application/octet-stream", kJls, "1 D application/octet-stream"},
+    {"multipart/related; type=image/jls;q=0.1, application/octet-stream", kJls,
+     "1 D application/octet-stream"},
     {"application/octet-stream", kNative, "1 application/octet-stream"},
     {"application/octet-stream", kJpeg, "1 D application/octet-stream"},
     {"image/jpeg", kJpeg, "1 image/jpeg"},
@@ -74,7 +77,8 @@ TEST(MediaTypes, OfPixelsAreWhatTheClientLikesBest)
         const QByteArray accept = *row.accept == '\0' ? QByteArray("*/*") : QByteArray(row.accept);
         PixelForm form;
         QByteArray given;
-        if (choosePixelForm(Http::AcceptHeader(accept), {row.stored, row.stored != kVideo, true, false}, form))
+        if (choosePixelForm(Http::AcceptHeader(accept), {row.stored, row.stored != kVideo, true, false},
+                            form))
             given = QByteArray(form.isSinglePart ? "1 " : "") + (form.isStored ? "" : "D ") + form.mediaType;
         EXPECT_EQ(given, row.given) << row.accept << " of " << row.stored;
     }
@@ -107,7 +111,8 @@ TEST(MediaTypes, OfInstancesAreWhatTheClientLikesBest)
         EXPECT_EQ(given, row.given) << row.accept;
     }
     InstanceForm form;
-    EXPECT_FALSE(chooseInstanceForm(Http::AcceptHeader("application/dicom"), false, form)) << "several in one";
+    EXPECT_FALSE(chooseInstanceForm(Http::AcceptHeader("application/dicom"), false, form))
+        << "several in one";
     ASSERT_TRUE(chooseInstanceForm(Http::AcceptHeader("*/*"), false, form));
     EXPECT_EQ(form.syntaxFor(kVideo, false), "") << "without a decoder";
 }

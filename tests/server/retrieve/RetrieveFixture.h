@@ -1,0 +1,199 @@
+#pragma once
+
+#include "server/dicomweb/retrieve/BulkDataResource.h"
+#include "server/dicomweb/retrieve/FramesResource.h"
+#include "server/dicomweb/retrieve/InstancesResource.h"
+#include "support/DatasetBuilder.h"
+#include "support/FileContent.h"
+#include "support/LogCapture.h"
+#include "support/RealFiles.h"
+#include "support/TemporaryStore.h"
+
+#include <QFile>
+
+#include <dcmtk/dcmdata/dcrledrg.h>
+#include <dcmtk/dcmdata/dcrleerg.h>
+#include <gtest/gtest.h>
+#include <kddlib/DicomFileReader.h>
+#include <kddlib/Limits.h>
+#include <kddlib/LogFile.h>
+#include <kddlib/OwnAttributes.h>
+#include <kddlib/QAData.h>
+#include <kddlib/TagMap.h>
+
+namespace Kdd::DicomWeb
+{
+
+constexpr const char* kInstance = "studies/1.2/series/1.2.3/instances/1.2.3.1";
+constexpr const char* kStored = "application/dicom; transfer-syntax=*";
+constexpr int kFrameBytes = 16 * 16 * 2;
+
+/// So many frames of 16 x 16 words, each frame of other bytes than the others.
+inline DatasetBuilder anImageWithFrames(int frames, const char* sopUID = "1.2.3.1")
+{
+    QByteArray pixels(frames * kFrameBytes, 0);
+    for (int i = 0; i < pixels.size(); ++i)
+        pixels[i] = static_cast<char>((i / kFrameBytes + 1) * 7 + i % 5);
+    DatasetBuilder image = anImage(sopUID).with(DCM_PatientName, "Wrong^Name").with(DCM_Rows, "16");
+    image.with(DCM_Columns, "16")
+        .with(DCM_BitsAllocated, "16")
+        .with(DCM_BitsStored, "16")
+        .with(DCM_HighBit, "15");
+    image.with(DCM_SamplesPerPixel, "1").with(DCM_PixelRepresentation, "0");
+    image.with(DCM_PhotometricInterpretation, "MONOCHROME2");
+    image.with(DCM_NumberOfFrames, QByteArray::number(frames).constData());
+    auto* element = new DcmPixelData(DcmTag(DCM_PixelData, EVR_OW));
+    element->putUint8Array(reinterpret_cast<const Uint8*>(pixels.constData()),
+                           static_cast<Uint32>(pixels.size()));
+    return image.with(element);
+}
+
+inline QByteArray frameOf(int number)
+{
+    QByteArray pixels(kFrameBytes, 0);
+    for (int i = 0; i < pixels.size(); ++i)
+        pixels[i] = static_cast<char>((number + 1) * 7 + (number * kFrameBytes + i) % 5);
+    return pixels;
+}
+
+class RetrieveTest : public testing::Test
+{
+protected:
+    RetrieveTest()
+    {
+        DcmRLEEncoderRegistration::registerCodecs();
+        DcmRLEDecoderRegistration::registerCodecs();
+        LogFile::setCallback([](LogFile::Severity, const char*, const std::string&) {});
+        const auto studies = std::make_shared<StudyShelf>(1 << 26, std::chrono::nanoseconds(-1'000'000'000));
+        const auto objects = std::make_shared<ObjectShelf>(1 << 20);
+        mResources.push_back(std::make_unique<FramesResource>(studies, objects));
+        mResources.push_back(std::make_unique<InstancesResource>(studies, objects));
+        mResources.push_back(std::make_unique<BulkDataResource>(studies, objects));
+    }
+    ~RetrieveTest() override { LogFile::setCallback(nullptr); }
+
+    QString path(const char* name) const { return mStore.filePath(name); }
+
+    void write(const char* name, const DatasetBuilder& image,
+               E_TransferSyntax syntax = EXS_LittleEndianExplicit)
+    {
+        DcmDataset copy(image.build());
+        DcmFileFormat file(&copy);
+        ASSERT_TRUE(file.getDataset()->chooseRepresentation(syntax, nullptr).good());
+        ASSERT_TRUE(file.saveFile(path(name).toLocal8Bit().constData(), syntax).good());
+    }
+
+    /// Puts the file into its study's tag file.
+    void add(const QString& path)
+    {
+        DcmFileFormat file;
+        TagFile study;
+        ASSERT_TRUE(readDicomFile(path.toLocal8Bit().constData(), file).good()) << qPrintable(path);
+        std::unique_ptr<TagMap> map(TagMap::createTagMap(file.getDataset(), kDefaultValueBound));
+        map->putAndInsertValue(kFilePath, VrCode::LO, path.toLocal8Bit());
+        study.addTagMap(map.release(), nullptr, true);
+        ASSERT_TRUE(study.mergeIntoCacheFile());
+    }
+
+    void add(const char* name, const DatasetBuilder& image,
+             E_TransferSyntax syntax = EXS_LittleEndianExplicit)
+    {
+        write(name, image, syntax);
+        add(path(name));
+    }
+
+    void correct(const DcmTagKey& key, const char* value, const char* oldStudy = "",
+                 const char* study = "1.2")
+    {
+        QAData job;
+        QString message;
+        job.studyUID = study;
+        job.oldStudyUID = oldStudy;
+        job.images = {"1.2.3.1"};
+        job.substitutions = {{key, QString::fromLatin1(value)}};
+        if (*oldStudy != '\0')
+            job.substitutions.append({DCM_StudyInstanceUID, QString::fromLatin1(study)});
+        EXPECT_TRUE(TagFile::applyQA(job, message)) << qPrintable(message);
+        EXPECT_EQ(job.outcome.changed, 1);
+    }
+
+    Http::Response get(const QByteArray& path, const QByteArray& accept = "*/*", const QByteArray& range = {})
+    {
+        Http::Request request;
+        request.headers = {{"accept", accept}};
+        if (!range.isEmpty())
+            request.headers.append({"range", range});
+        ResourcePath parsed;
+        if (!ResourcePath::parse(path.split('/').toVector(), parsed))
+            return Http::failure(404, QStringLiteral("no path"));
+        for (const auto& resource : mResources) {
+            if (resource->owns(parsed))
+                return resource->answer(request, parsed);
+        }
+        return Http::failure(404, QStringLiteral("nobody's path"));
+    }
+
+    static QByteArray bodyOf(Http::Response& response)
+    {
+        QByteArray body;
+        QByteArray block;
+        for (Http::BodyPart& part : response.body) {
+            if (const auto* bytes = std::get_if<QByteArray>(&part)) {
+                body += *bytes;
+            } else if (const auto* range = std::get_if<Http::FileRange>(&part)) {
+                EXPECT_TRUE(range->file->read(range->offset, range->length, block).good());
+                body += block;
+            } else {
+                auto& producer = *std::get<std::unique_ptr<Http::Producer>>(part);
+                do {
+                    const Result produced = producer.next(block);
+                    if (produced.bad())
+                        return "broken off";
+                    body += block;
+                } while (!block.isEmpty());
+            }
+        }
+        return body;
+    }
+
+    static QByteArray header(const Http::Response& response, const char* name)
+    {
+        for (const Http::Field& field : response.headers) {
+            if (field.name == name)
+                return field.value;
+        }
+        return {};
+    }
+
+    /// The parts of a multipart answer: header lines and body.
+    static QVector<std::pair<QByteArray, QByteArray>> partsOf(Http::Response& response)
+    {
+        const QByteArray type = header(response, "Content-Type");
+        const QByteArray mark = "--" + type.mid(type.indexOf("boundary=") + 9);
+        QByteArray body = bodyOf(response);
+        QVector<std::pair<QByteArray, QByteArray>> parts;
+        for (int at = body.indexOf(mark + "\r\n"); at >= 0;) {
+            const int next = body.indexOf(mark, at + 1);
+            const int head = body.indexOf("\r\n\r\n", at);
+            parts.append({body.mid(at + mark.size() + 2, head - at - mark.size() - 2),
+                          body.mid(head + 4, next - head - 6)});
+            at = body.mid(next + mark.size(), 2) == "--" ? -1 : next;
+        }
+        return parts;
+    }
+
+    static QByteArray nameIn(const QByteArray& dicom, const DcmTagKey& key = DCM_PatientName)
+    {
+        DcmFileFormat file;
+        OFString value;
+        if (readDicomBuffer(dicom, file).bad())
+            return "unreadable: " + dicom.left(60);
+        file.getDataset()->findAndGetOFString(key, value);
+        return QByteArray::fromStdString(value);
+    }
+
+    TemporaryStore mStore;
+    std::vector<std::unique_ptr<Resource>> mResources;
+};
+
+}  // namespace Kdd::DicomWeb
