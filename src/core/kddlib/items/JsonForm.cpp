@@ -6,9 +6,12 @@
 #include <dcmtk/dcmdata/dcelem.h>
 #include <dcmtk/dcmdata/dcjson.h>
 #include <dcmtk/dcmdata/dctag.h>
+#include <dcmtk/ofstd/ofstd.h>
 
 #include <algorithm>
 #include <charconv>
+#include <cmath>
+#include <cstring>
 #include <sstream>
 
 namespace Kdd
@@ -176,6 +179,44 @@ bool plainNumbers(QByteArray& out, const DcmTagKey& key, const char* vr, const Q
     return true;
 }
 
+/// With as many digits as DCMTK gives; what is no number has no short way.
+bool plainDoubles(QByteArray& out, const DcmTagKey& key, const QByteArray& bytes)
+{
+    constexpr int kSize = sizeof(double);
+    constexpr int kDigits = 17;
+    if (bytes.size() % kSize != 0)
+        return false;
+    const int begin = out.size();
+    appendOpening(out, key, "FD");
+    for (int at = 0; at < bytes.size(); at += kSize) {
+        double value = 0;
+        std::memcpy(&value, bytes.constData() + at, kSize);
+        if (!std::isfinite(value)) {
+            out.truncate(begin);
+            return false;
+        }
+        char digits[64];
+        OFStandard::ftoa(digits, sizeof digits, value, 0, 0, kDigits);
+        OFString number(digits);
+        DcmJsonFormat::normalizeDecimalString(number);
+        out.append(at == 0 ? R"(,"Value":[)" : ",").append(number.c_str());
+    }
+    out.append(bytes.isEmpty() ? "}" : "]}");
+    return true;
+}
+
+/// A private value of unknown kind. One of odd length would be padded, and a standard attribute may be of a younger VR.
+bool plainUnknown(QByteArray& out, const DcmTagKey& key, const QByteArray& bytes)
+{
+    if ((key.getGroup() & 1) == 0 || bytes.size() % 2 != 0)
+        return false;
+    appendOpening(out, key, "UN");
+    if (!bytes.isEmpty())
+        out.append(R"(,"InlineBinary":")").append(bytes.toBase64()).append('"');
+    out.append('}');
+    return true;
+}
+
 }  // namespace
 
 const JsonForm& JsonForm::instance()
@@ -187,6 +228,10 @@ const JsonForm& JsonForm::instance()
 bool JsonForm::plainValue(QByteArray& out, const DcmTagKey& key, VrCode vr, const QByteArray& bytes) const
 {
     switch (vr) {
+    case VrCode::FD:
+        return plainDoubles(out, key, bytes);
+    case VrCode::UN:
+        return plainUnknown(out, key, bytes);
     case VrCode::SL:
         return plainNumbers<qint32>(out, key, "SL", bytes);
     case VrCode::SS:
