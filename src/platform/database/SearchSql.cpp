@@ -1,5 +1,6 @@
 #include "platform/database/SearchSql.h"
 
+#include "platform/database/SearchColumns.h"
 #include "platform/database/SqlConnection.h"
 
 #include <algorithm>
@@ -11,64 +12,6 @@ namespace
 
 /// The engine's index of parts finds what has at least so many characters.
 constexpr int kIndexedPart = 3;
-
-enum class Where { Study, Words, Series, Request };
-
-struct Column
-{
-    const char* name;  // as it is compared, or sorted by
-    Where where;
-    const char* words;  // its column among the texts that are searched for parts; null: none
-};
-
-Column columnOf(SearchColumn column)
-{
-    switch (column) {
-    case SearchColumn::StudyUID:
-        return {"s.uid", Where::Study, nullptr};
-    case SearchColumn::StudyDate:
-        return {"s.study_date", Where::Study, nullptr};
-    case SearchColumn::StudyTime:
-        return {"s.study_time", Where::Study, nullptr};
-    case SearchColumn::AccessionNumber:
-        return {"s.accession_number", Where::Study, "accession_number"};
-    case SearchColumn::ModalitiesInStudy:
-        return {"m.modality", Where::Study, nullptr};
-    case SearchColumn::ReferringPhysician:
-        return {nullptr, Where::Words, "referring_physician"};
-    case SearchColumn::PatientName:
-        return {"s.sort_name", Where::Words, "patient_name"};
-    case SearchColumn::PatientID:
-        return {"s.patient_id", Where::Study, "patient_id"};
-    case SearchColumn::PatientBirthDate:
-        return {"s.patient_birth_date", Where::Study, nullptr};
-    case SearchColumn::PatientSex:
-        return {"s.patient_sex", Where::Study, nullptr};
-    case SearchColumn::StudyID:
-        return {"s.study_code", Where::Study, "study_code"};
-    case SearchColumn::StudyDescription:
-        return {nullptr, Where::Words, "description"};
-    case SearchColumn::SeriesUID:
-        return {"r.uid", Where::Series, nullptr};
-    case SearchColumn::Modality:
-        return {"r.modality", Where::Series, nullptr};
-    case SearchColumn::SeriesNumber:
-        return {"r.number_text", Where::Series, nullptr};
-    case SearchColumn::SeriesDescription:
-        return {"r.description", Where::Series, nullptr};
-    case SearchColumn::PerformedDate:
-        return {"r.performed_date", Where::Series, nullptr};
-    case SearchColumn::PerformedTime:
-        return {"r.performed_time", Where::Series, nullptr};
-    case SearchColumn::ScheduledStep:
-        return {"q.scheduled_step", Where::Request, nullptr};
-    case SearchColumn::RequestedProcedure:
-        return {"q.requested_procedure", Where::Request, nullptr};
-    case SearchColumn::SOPInstanceUID:
-        return {"f.sop_uid", Where::Series, nullptr};
-    }
-    return {"s.uid", Where::Study, nullptr};
-}
 
 /// The longest piece between two stars.
 QByteArray longestPart(const QByteArray& pattern)
