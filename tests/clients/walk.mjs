@@ -93,7 +93,8 @@ async function walkInstance(ids, image) {
   const one = Array.isArray(alone) ? alone[0] : alone;
   check(value(one, kInstance) === ids.sopInstanceUID, `metadata of ${ids.sopInstanceUID} is another's`);
   check(isPart10(await client.retrieveInstance(ids)), `${ids.sopInstanceUID} is no DICOM file`);
-  if (value(image, '00280010')) await walkFrames(ids, image);
+  // Objects without pixels may have the size of others.
+  if (value(image, '00280010') && image['7FE00010']) await walkFrames(ids, image);
   await walkBulkData(ids, image);
 }
 

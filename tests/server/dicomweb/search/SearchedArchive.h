@@ -70,7 +70,6 @@ protected:
         const QList<QByteArray> parts = QByteArray(target).split('?');
         Http::Request request;
         request.base = "http://host/dicom-web";
-        request.path.append("dicom-web");
         for (const QByteArray& segment : parts.front().split('/'))
             request.path.append(segment);
         for (const QByteArray& field : QByteArray(target).mid(parts.front().size() + 1).split('&')) {
