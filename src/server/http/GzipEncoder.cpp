@@ -12,7 +12,7 @@ namespace
 // Metadata is so alike from image to image that higher levels take several times as long to save some tenths.
 constexpr int kLevel = 1;
 
-constexpr int kWindowBits = 15 + 16;  // the largest window, with the frame of gzip
+constexpr int kWindowBits = 15;  // the largest window
 constexpr int kMemoryLevel = 9;
 constexpr int kStep = 16 * 1024;  // of output [bytes]
 
@@ -40,11 +40,12 @@ void GzipEncoder::Private::run(const QByteArray& block, int flush, QByteArray& o
     } while (stream.avail_out == 0);
 }
 
-GzipEncoder::GzipEncoder()
+GzipEncoder::GzipEncoder(Frame frame)
     : d(std::make_unique<Private>())
 {
+    const int bits = frame == Frame::Gzip ? kWindowBits + 16 : -kWindowBits;
     // With these arguments it fails for want of memory only.
-    if (deflateInit2(&d->stream, kLevel, Z_DEFLATED, kWindowBits, kMemoryLevel, Z_DEFAULT_STRATEGY) != Z_OK)
+    if (deflateInit2(&d->stream, kLevel, Z_DEFLATED, bits, kMemoryLevel, Z_DEFAULT_STRATEGY) != Z_OK)
         throw std::bad_alloc();
 }
 

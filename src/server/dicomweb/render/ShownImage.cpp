@@ -7,6 +7,7 @@
 #include <QList>
 
 #include <dcmtk/dcmdata/dctk.h>
+#include <kddlib/KxCurlClient.h>
 #include <kddlib/KxDcmFileLoader.h>
 #include <kddlib/KxVolumeInfo.h>
 #include <kddlib/LogFile.h>
@@ -75,7 +76,8 @@ Verdict ShownImage::open(const ServedStudy& study, const QByteArray& key)
         mFile->loadFile(OFFilename(origin.path.constData()), EXS_Unknown, EGL_noChange, kLongestInMemory);
     if (condition.bad()) {
         LogFile::errorf("%s: %s", origin.path.constData(), condition.text());
-        return {QFile::exists(mPath) ? 500 : 410, QStringLiteral("The instance's DICOM file cannot be read")};
+        const bool isGone = !KxCurlClient::isUrl(origin.path.constData()) && !QFile::exists(mPath);
+        return {isGone ? 410 : 500, QStringLiteral("The instance's DICOM file cannot be read")};
     }
     if (!isSame(dataset(), origin)) {
         LogFile::errorf("%s holds another image than %s by now", origin.path.constData(), key.constData());
@@ -104,8 +106,7 @@ Verdict ShownImage::draw(int frame, const RenderRequest& rendering, QImage& pict
     view.frame = frame;
     view.window = rendering.window;
     // A part of the picture may fill the viewport, so that it is needed as it is stored.
-    const bool isWhole = rendering.region.width == 0 && rendering.region.height == 0;
-    if (isWhole && !rendering.viewport.isEmpty()) {
+    if (rendering.region.isWhole() && !rendering.viewport.isEmpty()) {
         view.width = rendering.viewport.width();
         view.height = rendering.viewport.height();
     }
