@@ -5,6 +5,8 @@
 #include "server/Router.h"
 #include "server/StatusPages.h"
 #include "server/ViewerFiles.h"
+#include "server/access/AccessGate.h"
+#include "server/access/AuditTrail.h"
 #include "server/browser/BrowserService.h"
 #include "server/dicomweb/DicomWebService.h"
 #include "server/http/HttpServer.h"
@@ -29,6 +31,7 @@ Http::HttpSettings statusSettings(const ServerSettings& settings)
     made.address = settings.status.value_or(Http::ListenAddress());
     made.certificateFile.clear();
     made.keyFile.clear();
+    made.clientCaFile.clear();
     made.workers = 2;
     made.ioThreads = 1;
     made.connections = 100;
@@ -40,9 +43,50 @@ Result checkReach(const Http::ListenAddress& address)
     if (address.isLoopback())
         return {};
     return Result::failure(
-        QStringLiteral("%1 can be reached by other machines, and nobody is asked here who he is: "
-                       "listen at 127.0.0.1 or [::1], behind a server that does ask")
+        QStringLiteral("%1 can be reached by other machines, and nobody has decided who may do what: name an "
+                       "access file, or \"none\" where everybody who reaches the server may do everything")
             .arg(QString::fromUtf8(address.text())));
+}
+
+/// Whether what is decided can be held to.
+Result checkAccess(const ServerSettings& settings)
+{
+    const Access::AccessRules& rules = *settings.access;
+    const bool isEncrypted = !settings.http.certificateFile.isEmpty();
+    if (rules.certificates && !isEncrypted)
+        return Result::failure(QStringLiteral(
+            "Clients show certificates over TLS only: the server needs one itself, and a key"));
+    // Whoever reads a token on its way has it.
+    if (rules.tokens && !isEncrypted && !settings.http.address.isLoopback() &&
+        settings.addresses.proxies.isEmpty())
+        return Result::failure(
+            QStringLiteral(
+                "Tokens are taken over TLS only: %1 needs a certificate and a key, or the address of "
+                "the proxy that ends TLS in front of it")
+                .arg(QString::fromUtf8(settings.http.address.text())));
+    return {};
+}
+
+Result checkReach(const ServerSettings& settings)
+{
+    if (settings.access)
+        return checkAccess(settings);
+    Result result = checkReach(settings.http.address);
+    if (result.good() && settings.status)
+        result = checkReach(*settings.status);
+    return result;
+}
+
+/// A numeric address that it listens at is nobody else's name.
+void addOwnNames(ServerSettings& settings)
+{
+    const auto add = [&](const Http::ListenAddress& address) {
+        if (address.host != "0.0.0.0" && address.host != "::")
+            settings.addresses.hosts.append(address.text());
+    };
+    add(settings.http.address);
+    if (settings.status)
+        add(*settings.status);
 }
 
 /// Descriptors for files, the database and whatever else is open beside connections.
@@ -65,6 +109,37 @@ int affordableConnections(int wanted)
     return std::min(wanted, most);
 }
 
+std::unique_ptr<Access::AuditTrail> makeTrail(const ServerSettings& settings,
+                                              const QVector<QByteArray>& prefix)
+{
+    if (settings.access->audit.isEmpty())
+        return nullptr;
+    return std::make_unique<Access::AuditTrail>(settings.access->audit, Access::RightsTable(prefix),
+                                                settings.addresses.proxies);
+}
+
+class LogAndTrail : public Http::ExchangeObserver
+{
+public:
+    /// Both outlive this; there need not be a trail.
+    LogAndTrail(Http::ExchangeObserver& log, Http::ExchangeObserver* trail)
+        : mLog(log)
+        , mTrail(trail)
+    {
+    }
+
+    void ended(const Http::Exchange& exchange) override
+    {
+        mLog.ended(exchange);
+        if (mTrail != nullptr)
+            mTrail->ended(exchange);
+    }
+
+private:
+    Http::ExchangeObserver& mLog;
+    Http::ExchangeObserver* mTrail;
+};
+
 /// Those who watch are none of whom is watched.
 class Unobserved : public Http::ExchangeObserver
 {
@@ -79,10 +154,13 @@ struct Server::Private
     explicit Private(const ServerSettings& settings)
         : prefix(Router::segmentsOf(settings.prefix))
         , log(metrics, prefix, settings.slow)
+        , trail(makeTrail(settings, prefix))
+        , observers{log, trail.get()}
         , statusPages(metrics)
-        , guard(settings.addresses, router)
+        , gate(*settings.access, Access::RightsTable(prefix), settings.addresses.proxies, router)
+        , guard(settings.addresses, gate)
         , statusGuard(settings.addresses, statusPages)
-        , http(settings.http, guard, log)
+        , http(settings.http, guard, observers)
     {
         router.add(prefix,
                    std::make_unique<DicomWeb::DicomWebService>(prefix.size(), makeResources(archive)));
@@ -105,9 +183,12 @@ struct Server::Private
     ServedArchive archive;
     Http::Metrics metrics;
     RequestLog log;
+    std::unique_ptr<Access::AuditTrail> trail;
+    LogAndTrail observers;
     Unobserved unobserved;
     Router router;
     StatusPages statusPages;
+    Access::AccessGate gate;
     Access::AddressGuard guard;
     Access::AddressGuard statusGuard;
     Http::HttpServer http;
@@ -116,11 +197,10 @@ struct Server::Private
 
 std::unique_ptr<Server> Server::make(ServerSettings settings, Result& result)
 {
+    addOwnNames(settings);
     result = settings.addresses.normalise();
     if (result.good())
-        result = checkReach(settings.http.address);
-    if (result.good() && settings.status)
-        result = checkReach(*settings.status);
+        result = checkReach(settings);
     std::unique_ptr<ViewerFiles> viewer;
     const QVector<QByteArray> viewerPath = Router::segmentsOf(kViewerPath);
     if (result.good() && !settings.viewer.isEmpty())
@@ -128,7 +208,15 @@ std::unique_ptr<Server> Server::make(ServerSettings settings, Result& result)
     if (result.bad())
         return nullptr;
     settings.http.connections = affordableConnections(settings.http.connections);
+    if (!settings.access)
+        settings.access = Access::AccessRules::open();
+    if (settings.access->certificates)
+        settings.http.clientCaFile = settings.access->certificates->caFile;
     auto made = std::make_unique<Private>(settings);
+    if (made->trail != nullptr)
+        result = made->trail->check();
+    if (result.bad())
+        return nullptr;
     if (viewer != nullptr)
         made->router.add(viewerPath, std::move(viewer));
     return std::unique_ptr<Server>(new Server(std::move(made)));

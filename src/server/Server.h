@@ -1,5 +1,6 @@
 #pragma once
 
+#include "server/access/AccessRules.h"
 #include "server/access/AddressGuard.h"
 #include "server/http/HttpSettings.h"
 
@@ -18,6 +19,8 @@ struct ServerSettings
     Http::HttpSettings http;
     std::optional<Http::ListenAddress> status;  ///< of a listener for those who watch the server
     Access::AddressRules addresses;
+    std::optional<Access::AccessRules>
+        access;  ///< without them everybody may do everything, and only this machine reaches the server
     QByteArray prefix = "/dicom-web";      ///< of the paths of DICOMweb
     QString viewer;                        ///< folder of a viewer's files, served under /viewer; empty: none
     std::chrono::milliseconds slow{2000};  ///< requests that take longer are told in the log
@@ -27,8 +30,8 @@ struct ServerSettings
 class Server
 {
 public:
-    /// Null, with the reason in `result`, when the settings cannot be followed. Until it is known who may see what,
-    /// that includes every address that other machines reach.
+    /// Null, with the reason in `result`, when the settings cannot be followed. Where nobody has decided who may what, that
+    /// includes every address that other machines reach.
     static std::unique_ptr<Server> make(ServerSettings settings, Result& result);
 
     /// Stops.

@@ -45,6 +45,7 @@ constexpr Setting kSessionHosts = {"KDD_SESSION_HOSTS", "web/sessionhosts", ""};
 constexpr Setting kShareConnections = {"KDD_SHARE_CONNECTIONS", "web/shareconnections", "0"};
 constexpr Setting kServerListen = {"KDD_SERVER_LISTEN", "server/listen", "127.0.0.1:8042"};
 constexpr Setting kServerStatus = {"KDD_SERVER_STATUS", "server/status", ""};
+constexpr Setting kServerAccess = {"KDD_SERVER_ACCESS", "server/access", ""};
 constexpr Setting kServerPrefix = {"KDD_SERVER_PREFIX", "server/prefix", "/dicom-web"};
 constexpr Setting kServerCertificate = {"KDD_SERVER_CERTIFICATE", "server/certificate", ""};
 constexpr Setting kServerKey = {"KDD_SERVER_KEY", "server/key", ""};
@@ -218,6 +219,11 @@ QByteArray ExResource::serverListen()
 QByteArray ExResource::serverStatus()
 {
     return valueOf(kServerStatus);
+}
+
+QByteArray ExResource::serverAccess()
+{
+    return valueOf(kServerAccess);
 }
 
 QByteArray ExResource::serverPrefix()

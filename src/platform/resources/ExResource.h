@@ -83,6 +83,10 @@ public:
     /// Where it answers those who watch it, ADDRESS:PORT. KDD_SERVER_STATUS, server/status, empty: nowhere.
     static QByteArray serverStatus();
 
+    /// Who may do what there: an access file, or "none" where everybody may do everything. KDD_SERVER_ACCESS,
+    /// server/access, empty: everybody may, and only this machine reaches it.
+    static QByteArray serverAccess();
+
     /// What the paths of DICOMweb begin with. KDD_SERVER_PREFIX, server/prefix, "/dicom-web".
     static QByteArray serverPrefix();
 

@@ -12,7 +12,8 @@ namespace Kdd::Http
 /// A request and what became of it.
 struct Exchange
 {
-    Request request;  ///< of one that could not be read only what is known
+    Request request;    ///< of one that could not be read only what is known
+    QByteArray caller;  ///< who asked; empty where nobody knows
     int status = 0;
     qint64 bytes = 0;                      ///< sent, with the header
     std::chrono::microseconds duration{};  ///< from the whole request to the last byte handed to the system

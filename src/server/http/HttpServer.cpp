@@ -135,7 +135,7 @@ Result HttpServer::start()
     HttpSettings& settings = d->host.settings;
     if (!settings.certificateFile.isEmpty()) {
         Result result;
-        d->tls = TlsContext::make(settings.certificateFile, settings.keyFile, result);
+        d->tls = TlsContext::make(settings.certificateFile, settings.keyFile, settings.clientCaFile, result);
         if (result.bad())
             return result;
     }

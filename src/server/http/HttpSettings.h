@@ -12,8 +12,9 @@ struct HttpSettings
 {
     ListenAddress address;
     QByteArray
-        certificateFile;  ///< PEM, with the certificates up to the one that clients know; empty: no TLS
-    QByteArray keyFile;   ///< PEM
+        certificateFile;      ///< PEM, with the certificates up to the one that clients know; empty: no TLS
+    QByteArray keyFile;       ///< PEM
+    QByteArray clientCaFile;  ///< PEM, by which clients may show who they are; empty: they are not asked to
 
     int workers = 8;          ///< threads that answer
     int ioThreads = 2;        ///< threads that wait for sockets

@@ -25,7 +25,10 @@ struct Request
     QVector<Field> headers;  ///< names in small letters
     QByteArray base;         ///< address by which the client reached this server, without "/" at its end
     QByteArray peer;         ///< address of whoever is at the other end of the connection
-    QByteArray id;           ///< of this request, in logs and in the answer's X-Request-Id
+    bool isEncrypted = false;  ///< on its way from there
+    QByteArray
+        certificate;  ///< whom the certificate that the peer showed names, "CN=...,O=..."; empty: none was
+    QByteArray id;    ///< of this request, in logs and in the answer's X-Request-Id
 
     /// The value of a header, named in small letters; of one sent several times the values joined by ", ". Null when
     /// it was not sent.

@@ -32,6 +32,7 @@ struct Response
     int status = 200;
     QVector<Field> headers;  ///< Content-Length, Transfer-Encoding, Connection and Date come from the session
     std::vector<BodyPart> body;
+    QByteArray caller;  ///< who asked, for those who are told of the exchange; empty where nobody knows
 
     Response() = default;
     explicit Response(int code)

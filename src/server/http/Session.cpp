@@ -190,6 +190,8 @@ void Session::prepareRequest()
     mBegan = Clock::now();
     mRequest = mReader.take();
     mRequest.peer = mPeer;
+    mRequest.isEncrypted = qstrcmp(mTransport->scheme(), "https") == 0;
+    mRequest.certificate = mTransport->peerName();
     mRequest.id = requestId(mRequest.header("x-request-id"));
     mRequest.base = QByteArray(mTransport->scheme()) + "://" +
                     (mReader.host().isEmpty() ? mHost.settings.address.text() : mReader.host());
@@ -240,6 +242,7 @@ void Session::write(Response response)
     form.isOldVersion = mReader.isOldVersion();
     form.keepsConnection = mReader.keepsConnection() && !mIsRefused && !mHost.stops;
     form.id = mRequest.id;
+    mCaller = response.caller;
     mWriter.emplace(std::move(response), form);
     send();
 }
@@ -300,7 +303,7 @@ void Session::report(bool isWhole)
     --mHost.inFlight;
     const auto duration = std::chrono::duration_cast<std::chrono::microseconds>(Clock::now() - mBegan);
     mHost.observer.ended(
-        {mRequest, mWriter->status(), mWriter->bytesSent(), duration, isWhole, mWriter->fault()});
+        {mRequest, mCaller, mWriter->status(), mWriter->bytesSent(), duration, isWhole, mWriter->fault()});
     mWriter.reset();
     mRequest = {};
 }

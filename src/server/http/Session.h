@@ -82,6 +82,7 @@ private:
     RequestReader mReader;
     Request mRequest;
     QByteArray mPeer;
+    QByteArray mCaller;  // of the request that is answered
     std::optional<ResponseWriter> mWriter;
     Clock::time_point mDeadline;
     Clock::time_point mBegan;  // of the request that is answered

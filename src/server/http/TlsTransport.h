@@ -13,10 +13,11 @@ namespace Kdd::Http
 class TlsContext
 {
 public:
-    /// Null, with the reason and the file's name in `result`, when one of the files cannot be used or they do not belong
-    /// together.
+    /// With `clientCaFile` clients may show a certificate, which has to be good by one of those there; empty: they are not
+    /// asked for one. Null, with the reason and the file's name in `result`, when one of the files cannot be used or they
+    /// do not belong together.
     static std::unique_ptr<TlsContext> make(const QByteArray& certificateFile, const QByteArray& keyFile,
-                                            Result& result);
+                                            const QByteArray& clientCaFile, Result& result);
     ~TlsContext();
 
     /// For the server's side of a connection. The socket stays the caller's, and open for longer than what is returned;

@@ -44,6 +44,10 @@ public:
     virtual void endWriting() = 0;
 
     virtual const char* scheme() const = 0;
+
+    /// Whom the certificate names that the other side showed and that was found good, as RFC 2253 writes it; empty when it
+    /// showed none.
+    virtual QByteArray peerName() const { return {}; }
 };
 
 /// The socket itself. It stays the caller's, and open for longer than this.

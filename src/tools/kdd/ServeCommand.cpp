@@ -26,6 +26,7 @@ struct ServeRequest
 {
     QByteArray listen;
     QByteArray status;
+    QString access;
     QString certificate;
     QString key;
     int threads = 0;
@@ -103,6 +104,23 @@ int threadCount(const ServeRequest& request)
     return wanted > 0 ? wanted : std::max(4, 2 * static_cast<int>(std::thread::hardware_concurrency()));
 }
 
+/// Nothing is decided where nothing is named.
+bool readAccess(const ServeRequest& request, std::optional<Access::AccessRules>& access)
+{
+    const QString named =
+        request.access.isEmpty() ? QFile::decodeName(ExResource::serverAccess()) : request.access;
+    if (named.isEmpty())
+        return true;
+    if (named == QLatin1String("none")) {
+        access = Access::AccessRules::open();
+        return true;
+    }
+    const Result result = Access::AccessRules::read(named, access.emplace());
+    if (result.bad())
+        LogFile::errorf("The access file cannot be followed: %s", qUtf8Printable(result.text()));
+    return result.good();
+}
+
 void readLimits(const ServeRequest& request, Http::HttpSettings& http)
 {
     http.workers = threadCount(request);
@@ -118,7 +136,7 @@ bool readSettings(const ServeRequest& request, ServerSettings& settings)
     const QByteArray status = orElse(request.status, ExResource::serverStatus());
     if (!readAddress(orElse(request.listen, ExResource::serverListen()), settings.http.address) ||
         (!status.isEmpty() && !readAddress(status, settings.status.emplace())) ||
-        !readTls(request, settings.http))
+        !readTls(request, settings.http) || !readAccess(request, settings.access))
         return false;
     readLimits(request, settings.http);
     settings.prefix = ExResource::serverPrefix();
@@ -181,9 +199,10 @@ void declareServe(CommandSet& commands)
     const CommandText text = {
         "serve", kServing, "Answer DICOMweb requests over HTTP",
         "Runs until it is interrupted, and answers the requests in flight before it ends. It listens only "
-        "where no "
-        "other machine reaches it. What has no option here is a setting of the site, as each option is.",
+        "where no other machine reaches it until --access says who may do what. What has no option here is a "
+        "setting of the site, as each option is.",
         "kdd serve\n"
+        "kdd serve --listen 0.0.0.0:8443 --tls-cert tls.pem --tls-key key.pem --access access.json\n"
         "kdd serve --viewer viewer --public https://images.example.org"};
     const auto request = std::make_shared<ServeRequest>();
     ArgumentList arguments = commands.declare(
@@ -193,6 +212,8 @@ void declareServe(CommandSet& commands)
     arguments.text(
         {"--status", kListenAddress, "Where to answer /healthz, /readyz and /metrics (default: nowhere)"},
         request->status);
+    arguments.path({"--access", "FILE|none", "Who may do what (default: all, from this machine only)"},
+                   request->access);
     arguments.path({"--tls-cert", kFile, "Certificate and those above it, in PEM (default: no TLS)"},
                    request->certificate);
     arguments.path({"--tls-key", kFile, "The certificate's key, in PEM"}, request->key);

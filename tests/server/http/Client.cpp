@@ -47,6 +47,29 @@ Client::Client(const QByteArray& address, Tls tls, int window)
     if (tls == Tls::No)
         return;
     mContext.reset(SSL_CTX_new(TLS_client_method()));
+    agree();
+}
+
+Client::Client(const QByteArray& address, const TlsFiles* shown,
+               const QVector<QPair<QByteArray, QByteArray>>& options)
+    : Client(address)
+{
+    mContext.reset(SSL_CTX_new(TLS_client_method()));
+    const std::unique_ptr<SSL_CONF_CTX, void (*)(SSL_CONF_CTX*)> conf(SSL_CONF_CTX_new(), SSL_CONF_CTX_free);
+    SSL_CONF_CTX_set_flags(conf.get(), SSL_CONF_FLAG_FILE | SSL_CONF_FLAG_CLIENT);
+    SSL_CONF_CTX_set_ssl_ctx(conf.get(), mContext.get());
+    for (const auto& option : options)
+        if (SSL_CONF_cmd(conf.get(), option.first.constData(), option.second.constData()) <= 0)
+            throw std::runtime_error("openssl knows no " + option.first.toStdString());
+    if (shown != nullptr) {
+        SSL_CTX_use_certificate_chain_file(mContext.get(), shown->certificate().constData());
+        SSL_CTX_use_PrivateKey_file(mContext.get(), shown->key().constData(), SSL_FILETYPE_PEM);
+    }
+    agree();
+}
+
+void Client::agree()
+{
     mTls.reset(SSL_new(mContext.get()));
     SSL_set_fd(mTls.get(), mSocket);
     mIsConnected = SSL_connect(mTls.get()) == 1;

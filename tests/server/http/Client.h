@@ -1,7 +1,9 @@
 #pragma once
 
 #include <QByteArray>
+#include <QPair>
 #include <QTemporaryDir>
+#include <QVector>
 
 #include <openssl/ssl.h>
 
@@ -42,6 +44,11 @@ public:
 
     /// To an address as a server tells it; with a small window, so that little is on its way, when `window` is not 0.
     explicit Client(const QByteArray& address, Tls tls = Tls::No, int window = 0);
+
+    /// Over TLS, with a certificate to show and as far as these options of OpenSSL's commands go: {{"MaxProtocol",
+    /// "TLSv1.1"}}.
+    Client(const QByteArray& address, const TlsFiles* shown,
+           const QVector<QPair<QByteArray, QByteArray>>& options);
     ~Client();
     Client(const Client&) = delete;
     Client& operator=(const Client&) = delete;
@@ -61,6 +68,7 @@ public:
     QByteArray rest();
 
 private:
+    void agree();
     bool receiveMore();
     bool receiveUntil(const QByteArray& end);
     QByteArray take(qint64 size);

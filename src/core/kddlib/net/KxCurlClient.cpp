@@ -6,12 +6,14 @@
 #include "kddlib/net/cloud/KxCurlUploadStreambuf.h"
 #include "kddlib/net/cloud/KxGoogleAuth.h"
 #include "kddlib/net/http/CurlShare.h"
+#include "kddlib/net/http/HttpAnswer.h"
 #include "kddlib/net/http/KxCurlDownloadStream.h"
 #include "kddlib/net/http/KxCurlDownloadStreambuf.h"
 #include "kddlib/net/http/KxCurlRequest.h"
 #include "kddlib/net/http/Redirects.h"
 #include "kddlib/net/http/RequestAddress.h"
 #include "kddlib/net/http/TlsLocks.h"
+#include "kddlib/net/http/WebOrigin.h"
 #include "kddlib/net/http/WholeBody.h"
 #include "platform/base/Result.h"
 #include "platform/resources/ExResource.h"
@@ -51,6 +53,11 @@ CurlShare::Connections connectionsOfSite()
 {
     return ExResource::sharesConnections() ? CurlShare::Connections::Shared
                                            : CurlShare::Connections::PerHandle;
+}
+
+bool isThisMachine(const std::string& host)
+{
+    return host == "127.0.0.1" || host == "localhost" || host == "[::1]" || host == "::1";
 }
 
 void requireCloudObject(const std::string& address)
@@ -282,6 +289,30 @@ QByteArray KxCurlClient::readBytes(const std::string& url, KxHttpStatus& status)
 QJsonDocument KxCurlClient::readJson(const std::string& url, KxHttpStatus& status)
 {
     return QJsonDocument::fromJson(readBytes(url, status));
+}
+
+Result KxCurlClient::readTrusted(const std::string& url, const QByteArray& caFile, qint64 most,
+                                 std::chrono::milliseconds patience, QByteArray& body)
+{
+    const WebOrigin origin = originOf(url);
+    if (!origin.isValid() || (origin.scheme == "http" && !isThisMachine(origin.host)))
+        return Result::failure(QStringLiteral("it is no address of HTTPS"))
+            .within(QString::fromStdString(url));
+    try {
+        KxCurlRequest request(mPrivate->ownHandles, mPrivate->share, url, "GET");
+        request.demandProof(caFile);
+        request.setBounds(most, patience);
+        request.perform();
+        if (request.status().code != kOk)
+            return Result::failure(QString::fromStdString(request.status().reason().empty()
+                                                              ? "it is elsewhere"
+                                                              : request.status().reason()))
+                .within(QString::fromStdString(url));
+        body = request.response();
+    } catch (const std::exception& fault) {
+        return Result::failure(QString::fromUtf8(fault.what())).within(QString::fromStdString(url));
+    }
+    return {};
 }
 
 QJsonDocument KxCurlClient::postBytes(const std::string& url, const QByteArray& body,

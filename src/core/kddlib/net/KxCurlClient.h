@@ -4,6 +4,7 @@
 
 #include <QByteArray>
 
+#include <chrono>
 #include <string>
 #include <vector>
 
@@ -15,6 +16,7 @@ namespace Kdd
 
 class KxCurlDownloadStream;
 class KxCurlUploadStream;
+class Result;
 struct KxHttpStatus;
 
 /// The one way by which the library reads and writes over HTTP and HTTPS.
@@ -90,6 +92,13 @@ public:
 
     /// The body as JSON; a null document when it is none.
     QJsonDocument readJson(const std::string& url, KxHttpStatus& status);
+
+    /// What must come from whom it is said to come from, such as keys that others are trusted by: the whole body, up to
+    /// `most` bytes within `patience`. The server has to prove who it is whatever the site's settings say of others, by
+    /// the certificates in `caFile` (PEM), or when that is empty those of the settings or the system; plain HTTP is for this machine
+    /// alone. No session is told and no redirect followed. A failure, with `body` as it was, also for any code but 200.
+    Result readTrusted(const std::string& url, const QByteArray& caFile, qint64 most,
+                       std::chrono::milliseconds patience, QByteArray& body);
 
     /// Sends a body, also an empty one, and returns the answer as JSON; a null document when it is none.
     QJsonDocument postBytes(const std::string& url, const QByteArray& body, const std::string& contentType,

@@ -1,8 +1,9 @@
 #include "kddlib/net/http/KxCurlRequest.h"
 
-#include "kddlib/Limits.h"
 #include "platform/base/BuildInfo.h"
+#include "platform/resources/ExResource.h"
 
+#include <algorithm>
 #include <utility>
 
 namespace Kdd
@@ -35,6 +36,24 @@ KxCurlRequest::KxCurlRequest(std::shared_ptr<KxCurlHandleFactory> factory, const
 KxCurlRequest::~KxCurlRequest()
 {
     mFactory->giveBack(std::move(mEasy));
+}
+
+void KxCurlRequest::demandProof(const QByteArray& caFile)
+{
+    mOptions.set(CURLOPT_SSL_VERIFYPEER, 1L);
+    mOptions.set(CURLOPT_SSL_VERIFYHOST, 2L);
+    mOptions.set(CURLOPT_SSLVERSION, static_cast<long>(CURL_SSLVERSION_TLSv1_2));
+    // Who has to be trusted is asked with what the library offers, not with what suits one storage.
+    mOptions.set(CURLOPT_SSL_CIPHER_LIST, static_cast<const char*>(nullptr));
+    const QByteArray trusted = caFile.isEmpty() ? ExResource::tlsCaFile() : caFile;
+    if (!trusted.isEmpty())
+        mOptions.set(CURLOPT_CAINFO, trusted.constData());
+}
+
+void KxCurlRequest::setBounds(qint64 most, std::chrono::milliseconds time)
+{
+    mMost = std::min(most, kMaxResponseSize);
+    mOptions.set(CURLOPT_TIMEOUT_MS, static_cast<long>(time.count()));
 }
 
 void KxCurlRequest::perform(const QByteArray& body)
@@ -77,8 +96,10 @@ std::size_t KxCurlRequest::receiveBody(char* bytes, std::size_t size, std::size_
 void KxCurlRequest::takeBody(const char* bytes, std::size_t length)
 {
     // Held against what is left of the bound, because a sum could wrap.
-    if (length > static_cast<std::size_t>(kMaxResponseSize - mResponse.size()))
-        throw CurlError(CURLE_FILESIZE_EXCEEDED, "The response has a body of more than 1 GiB");
+    if (length > static_cast<std::size_t>(mMost - mResponse.size())) {
+        const std::string text = mMost == kMaxResponseSize ? "1 GiB" : std::to_string(mMost) + " bytes";
+        throw CurlError(CURLE_FILESIZE_EXCEEDED, ("The response has a body of more than " + text).c_str());
+    }
     mResponse.append(bytes, static_cast<int>(length));
     mStatus.bytesReceived += length;
 }

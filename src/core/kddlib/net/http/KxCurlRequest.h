@@ -1,5 +1,6 @@
 #pragma once
 
+#include "kddlib/Limits.h"
 #include "kddlib/net/http/CurlOptions.h"
 #include "kddlib/net/http/HeaderReceiver.h"
 #include "kddlib/net/http/KxCurlHandleFactory.h"
@@ -7,6 +8,7 @@
 
 #include <QByteArray>
 
+#include <chrono>
 #include <memory>
 #include <string>
 
@@ -29,6 +31,14 @@ public:
     ~KxCurlRequest();
     KxCurlRequest(const KxCurlRequest&) = delete;
     KxCurlRequest& operator=(const KxCurlRequest&) = delete;
+
+    /// Demands that the server prove by its certificate who it is, whatever the site's settings say of others: by those in
+    /// `caFile` (PEM); when that is empty those of the site's settings, or else of the system. Nothing older than TLS 1.2 is spoken then.
+    void demandProof(const QByteArray& caFile);
+
+    /// Fails the transfer beyond so much of a body [bytes] or time. Without it Limits.h bounds the one and a stall the
+    /// other.
+    void setBounds(qint64 most, std::chrono::milliseconds time);
 
     /// As HeaderLines::add.
     void addHeader(const std::string& line) { mHeaders.add(line); }
@@ -60,6 +70,7 @@ private:
     CallbackFault mFault;
     HeaderReceiver mHeaderReceiver;
     QByteArray mResponse;
+    qint64 mMost = kMaxResponseSize;
 };
 
 }  // namespace Kdd

@@ -1,0 +1,41 @@
+#pragma once
+
+#include "server/access/Caller.h"
+#include "server/http/Request.h"
+
+namespace Kdd::Access
+{
+
+/// What a request asks for, as far as its path and method tell.
+struct Asked
+{
+    enum class Verdict {
+        Open,     ///< a file of the program's own pages, in which nothing of the archive stands
+        Needs,    ///< `right`
+        Unknown,  ///< no resource has this path
+        NotSo,    ///< one has, but not by this method
+    };
+
+    Verdict verdict = Verdict::Unknown;
+    Right right = Right::Read;
+    const char* kind = "other";  ///< of resource, for those who count and keep trails
+    QByteArray study;            ///< that it is about; empty where it is not about one
+};
+
+/// The one table of what takes which right. What is not in it is answered to nobody.
+class RightsTable
+{
+public:
+    /// `prefix` leads to DICOMweb.
+    explicit RightsTable(QVector<QByteArray> prefix)
+        : mPrefix(std::move(prefix))
+    {
+    }
+
+    Asked find(const Http::Request& request) const;
+
+private:
+    QVector<QByteArray> mPrefix;
+};
+
+}  // namespace Kdd::Access

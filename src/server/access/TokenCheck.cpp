@@ -1,0 +1,122 @@
+#include "server/access/TokenCheck.h"
+
+#include "server/access/SignedToken.h"
+#include "server/access/TokenClaims.h"
+
+#include <openssl/evp.h>
+
+namespace Kdd::Access
+{
+namespace
+{
+
+/// Tokens that are known at a time, each with 200 bytes or so. Beyond it all are forgotten, which costs each one
+/// signature.
+constexpr int kMostKnown = 20000;
+
+QByteArray digestOf(const QByteArray& token)
+{
+    QByteArray digest(EVP_MAX_MD_SIZE, '\0');
+    unsigned int size = 0;
+    if (EVP_Digest(token.constData(), static_cast<std::size_t>(token.size()),
+                   reinterpret_cast<uchar*>(digest.data()), &size, EVP_sha256(), nullptr) != 1)
+        return {};
+    digest.truncate(static_cast<int>(size));
+    return digest;
+}
+
+std::chrono::seconds systemTime()
+{
+    return std::chrono::duration_cast<std::chrono::seconds>(
+        std::chrono::system_clock::now().time_since_epoch());
+}
+
+TokenCheck::Verdict refusal(const char* fault)
+{
+    TokenCheck::Verdict verdict;
+    verdict.fault = fault;
+    return verdict;
+}
+
+TokenCheck::Verdict undecidable()
+{
+    TokenCheck::Verdict verdict;
+    verdict.isUndecidable = true;
+    return verdict;
+}
+
+}  // namespace
+
+TokenCheck::TokenCheck(const TokenRules& rules, ProviderKeys::Fetch fetch, ProviderKeys::Clock clock)
+    : mRules(rules)
+    , mClock(clock)
+    , mKeys(rules, std::move(fetch), std::move(clock))
+{
+}
+
+TokenCheck::TokenCheck(const TokenRules& rules)
+    : TokenCheck(rules, ProviderKeys::fetchOf(rules), &systemTime)
+{
+}
+
+TokenCheck::Verdict TokenCheck::check(const QByteArray& token)
+{
+    const std::shared_ptr<const TokenKeys> keys = mKeys.present();
+    const QByteArray digest = digestOf(token);
+    Verdict verdict;
+    if (keys == nullptr || digest.isEmpty())
+        return undecidable();
+    if (find(digest, keys, verdict.caller))
+        return verdict;
+    return verify(token, digest, keys);
+}
+
+TokenCheck::Verdict TokenCheck::verify(const QByteArray& token, const QByteArray& digest,
+                                       std::shared_ptr<const TokenKeys> keys)
+{
+    SignedToken read;
+    if (!SignedToken::parse(token, read))
+        return refusal("The token cannot be read");
+    // A provider that changes its keys signs with ones that are not known yet.
+    if (!keys->has(read.keyId, read.algorithm))
+        keys = mKeys.newerThan(keys);
+    if (keys == nullptr)
+        return undecidable();
+    if (!keys->has(read.keyId, read.algorithm))
+        return refusal("The key of the token is not known");
+    if (!keys->verify(read.keyId, read.algorithm, read.text, read.signature))
+        return refusal("The signature of the token is not good");
+    Known known;
+    Verdict verdict;
+    verdict.fault = faultOfClaims(read.claims, mRules, mClock(), known.until);
+    if (verdict.fault.isEmpty() && !callerOfClaims(read.claims, mRules, known.caller))
+        verdict.fault = "The token names nobody";
+    if (!verdict.fault.isEmpty())
+        return verdict;
+    keep(digest, keys, known);
+    verdict.caller = known.caller;
+    return verdict;
+}
+
+bool TokenCheck::find(const QByteArray& digest, const std::shared_ptr<const TokenKeys>& keys, Caller& caller)
+{
+    const std::lock_guard<std::mutex> lock(mMutex);
+    const auto known = mKnownBy == keys ? mKnown.constFind(digest) : mKnown.constEnd();
+    if (known == mKnown.constEnd() || mClock() >= known->until)
+        return false;
+    caller = known->caller;
+    return true;
+}
+
+void TokenCheck::keep(const QByteArray& digest, const std::shared_ptr<const TokenKeys>& keys,
+                      const Known& known)
+{
+    const std::lock_guard<std::mutex> lock(mMutex);
+    // A key that was taken back takes its tokens with it.
+    if (mKnownBy != keys || mKnown.size() >= kMostKnown)
+        mKnown.clear();
+    mKnownBy = keys;
+    mKnown.insert(digest, known);
+}
+
+}  // namespace Kdd::Access

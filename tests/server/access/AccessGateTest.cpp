@@ -1,0 +1,260 @@
+#include "server/access/AccessGate.h"
+
+#include "server/access/TokenIssuer.h"
+
+#include <gtest/gtest.h>
+
+using namespace Kdd;
+using namespace Kdd::Access;
+
+namespace
+{
+
+QByteArray headerOf(const Http::Response& response, const char* name)
+{
+    QByteArray joined;
+    for (const Http::Field& field : response.headers)
+        if (field.name == name)
+            joined += (joined.isEmpty() ? "" : "|") + field.value;
+    return joined;
+}
+
+/// What is let in, and with which headers.
+class Inside : public Http::Handler
+{
+public:
+    Http::Response answer(const Http::Request& request) override
+    {
+        QByteArray names;
+        for (const Http::Field& field : request.headers)
+            names += field.name + ' ';
+        return Http::textResponse(200, "text/plain", names);
+    }
+};
+
+class AccessGateTest : public testing::Test
+{
+protected:
+    AccessGateTest()
+    {
+        mRequest.base = "https://pacs.example/images";
+        mRequest.peer = "10.0.0.1";
+        mRequest.isEncrypted = true;
+        mRequest.path = {"dicom-web", "studies"};
+    }
+
+    Http::Response answer(const QVector<Http::Field>& headers = {})
+    {
+        Inside inside;
+        Http::Request request = mRequest;
+        request.headers = headers;
+        return AccessGate(mRules, RightsTable({"dicom-web"}), {"10.0.0.9"}, inside).answer(request);
+    }
+    int status(const QVector<Http::Field>& headers = {}) { return answer(headers).status; }
+
+    /// By the method and the path, for somebody of these rights.
+    int statusFor(Rights rights, Http::Method method, const char* path)
+    {
+        mRules.anyone = rights;
+        mRequest.method = method;
+        mRequest.path.clear();
+        for (const QByteArray& segment : QByteArray(path).split('/'))
+            if (!segment.isEmpty())
+                mRequest.path.append(segment);
+        return status();
+    }
+
+    void useHeader()
+    {
+        mRules.header = HeaderRules{"x-user", {"10.0.0.1"}, {{"*", Right::Read}, {"anna", Right::Store}}};
+    }
+
+    AccessRules mRules;
+    Http::Request mRequest;
+};
+
+TEST_F(AccessGateTest, AsksForTheRightThatARequestTakes)
+{
+    constexpr auto kGet = Http::Method::Get;
+    constexpr auto kPost = Http::Method::Post;
+    constexpr auto kDelete = Http::Method::Delete;
+    const struct
+    {
+        Http::Method method;
+        const char* path;
+        Rights needs;
+    } kRequests[] = {
+        {kGet, "dicom-web/studies", Right::Read},
+        {Http::Method::Head, "dicom-web/studies", Right::Read},
+        {Http::Method::Options, "dicom-web/studies", Right::Read},
+        {kPost, "dicom-web/studies", Right::Store},
+        {kPost, "dicom-web/studies/1.2", Right::Store},
+        {kGet, "dicom-web/studies/1.2/corrections", Right::Read},
+        {kPost, "dicom-web/studies/1.2/corrections", Right::Correct},
+        {kDelete, "dicom-web/studies/1.2/series/1.3", Right::Delete},
+        {kGet, "browser/studies/1.2/corrections", Right::Read},
+        {kGet, "browser/config", Right::Read},
+    };
+    for (const auto& each : kRequests) {
+        EXPECT_EQ(statusFor(each.needs, each.method, each.path), 200) << each.path;
+        EXPECT_EQ(statusFor(kAllRights & ~each.needs, each.method, each.path), 403) << each.path;
+        EXPECT_EQ(statusFor({}, each.method, each.path), 403) << each.path;
+    }
+    for (const char* path : {"", "page/app.js", "viewer/app.js"})
+        EXPECT_EQ(statusFor({}, kGet, path), 200) << path;
+}
+
+TEST_F(AccessGateTest, RefusesWhatStandsInNoTable)
+{
+    for (const char* path : {"dicom-web", "dicom-web/made-up", "dicom-web/studies/1.2/made-up", "made-up",
+                             "healthz", "dicom-web/studies/a b", "Browser/config"})
+        EXPECT_EQ(statusFor(kAllRights, Http::Method::Get, path), 404) << path;
+    for (const char* path : {"dicom-web/changefeed", "browser/config"})
+        EXPECT_EQ(statusFor(kAllRights, Http::Method::Post, path), 405) << path;
+    EXPECT_EQ(statusFor(kAllRights, Http::Method::Other, "dicom-web/studies"), 405);
+    EXPECT_EQ(statusFor({}, Http::Method::Get, "dicom-web/made-up"), 403);
+}
+
+TEST_F(AccessGateTest, BelievesNamesOfNamedPeersOnly)
+{
+    useHeader();
+    const Http::Response good = answer({{"x-user", "anna"}, {"accept", "*/*"}, {"cookie", "a"}});
+    EXPECT_EQ(good.status, 200);
+    EXPECT_EQ(good.caller, "anna");
+    EXPECT_EQ(std::get<QByteArray>(good.body[0]), "accept ");
+    EXPECT_EQ(headerOf(good, "Cache-Control"), "private");
+    EXPECT_EQ(status({{"x-user", "anna"}, {"x-user", "eve"}}), 403);
+    EXPECT_EQ(status({{"x-user", ""}}), 403);
+    EXPECT_EQ(status(), 403);
+    mRequest.peer = "10.0.0.2";
+    EXPECT_EQ(status({{"x-user", "anna"}}), 403);
+    // Nor does it get further in.
+    mRules.anyone = Right::Read;
+    const Http::Response anybody = answer({{"x-user", "anna"}});
+    EXPECT_EQ(anybody.caller, "");
+    EXPECT_EQ(std::get<QByteArray>(anybody.body[0]), "");
+}
+
+TEST_F(AccessGateTest, GivesUsersWhatTheirNamesDo)
+{
+    useHeader();
+    mRequest.method = Http::Method::Post;
+    EXPECT_EQ(status({{"x-user", "anna"}}), 200);
+    EXPECT_EQ(status({{"x-user", "bert"}}), 403);
+    EXPECT_EQ(status({{"x-user", "*"}}), 403);
+    mRules.header.reset();
+    mRules.certificates = CertificateRules{"ca.pem", {{"CN=scanner,O=A", Right::Store}}};
+    EXPECT_EQ(status(), 403);
+    mRequest.certificate = "CN=scanner,O=B";
+    EXPECT_EQ(status(), 403);
+    mRequest.certificate = "CN=scanner,O=A";
+    EXPECT_EQ(status(), 200);
+}
+
+TEST_F(AccessGateTest, LetsPagesOfNamedOriginsReadAnswers)
+{
+    mRules.anyone = Right::Read;
+    EXPECT_EQ(headerOf(answer({{"origin", "https://viewer.example"}}), "Vary"), "");
+    mRules.origins.origins = {"https://viewer.example:443", "http://localhost:3000"};
+    const Http::Response named = answer({{"origin", "https://viewer.example"}});
+    EXPECT_EQ(headerOf(named, "Access-Control-Allow-Origin"), "https://viewer.example");
+    EXPECT_TRUE(headerOf(named, "Access-Control-Expose-Headers").contains("Content-Location"));
+    EXPECT_EQ(headerOf(named, "Vary"), "Origin");
+    for (const char* origin :
+         {"https://viewer.example.evil", "http://viewer.example", "null", "https://Viewer.example"}) {
+        const Http::Response other = answer({{"origin", origin}});
+        EXPECT_EQ(headerOf(other, "Access-Control-Allow-Origin"), "") << origin;
+        EXPECT_EQ(headerOf(other, "Vary"), "Origin") << origin;
+    }
+    // Also of a refusal, which a page wants to show.
+    mRules.anyone = {};
+    EXPECT_EQ(headerOf(answer({{"origin", "http://localhost:3000"}}), "Access-Control-Allow-Origin"),
+              "http://localhost:3000");
+}
+
+TEST_F(AccessGateTest, AnswersBrowsersThatAskBeforehandWithoutToken)
+{
+    mRules.origins.origins = {"https://viewer.example"};
+    mRequest.method = Http::Method::Options;
+    const Http::Field origin = {"origin", "https://viewer.example"};
+    const Http::Field method = {"access-control-request-method", "GET"};
+    const Http::Response asked =
+        answer({origin, method, {"access-control-request-headers", "accept,authorization"}});
+    EXPECT_EQ(asked.status, 204);
+    EXPECT_EQ(headerOf(asked, "Access-Control-Allow-Origin"), "https://viewer.example");
+    EXPECT_EQ(headerOf(asked, "Access-Control-Allow-Headers"),
+              "Accept, Authorization, Content-Type, If-None-Match, Range");
+    EXPECT_EQ(headerOf(asked, "Access-Control-Max-Age"), "7200");
+    EXPECT_EQ(status({{"origin", "https://evil.example"}, method}), 403);
+    EXPECT_EQ(status({origin}), 403);
+    mRules.origins.origins.clear();
+    EXPECT_EQ(status({origin, method}), 403);
+}
+
+TEST_F(AccessGateTest, LetsNoPageOfOtherOriginsChangeAnything)
+{
+    mRules.anyone = kAllRights;
+    mRequest.method = Http::Method::Post;
+    mRules.origins.origins = {"https://viewer.example"};
+    for (const char* origin : {"https://pacs.example", "https://viewer.example"})
+        EXPECT_EQ(status({{"origin", origin}}), 200) << origin;
+    for (const char* origin :
+         {"https://evil.example", "null", "", "http://pacs.example", "https://pacs.example:8443"})
+        EXPECT_EQ(status({{"origin", origin}}), 403) << origin;
+}
+
+TEST_F(AccessGateTest, TellsWhatIsWrongWithATokenAndNothingOfIt)
+{
+    const QTemporaryDir folder;
+    const QString keys = folder.filePath(QStringLiteral("keys.json"));
+    const TokenIssuer issuer;
+    putFile(keys, issuer.keySet());
+    TokenRules tokens;
+    tokens.issuer = QStringLiteral("https://login.example");
+    tokens.audiences = {QStringLiteral("archive")};
+    tokens.keys = keys.toLocal8Bit();
+    tokens.rights = {{QStringLiteral("scope"), QStringLiteral("images.read"), Right::Read}};
+    mRules.tokens = tokens;
+    const QByteArray good = "Bearer " + issuer.token(TokenIssuer::claimsWith("exp", 2 * kNow));
+    const QByteArray invalid = R"(Bearer realm="kdd", error="invalid_token", error_description="The token )";
+    const struct
+    {
+        QVector<Http::Field> headers;
+        int status;
+        QByteArray challenge;
+    } kHeaders[] = {
+        {{{"authorization", good}}, 200, ""},
+        {{{"authorization", "bEARER" + good.mid(6)}}, 200, ""},
+        {{}, 401, R"(Bearer realm="kdd")"},
+        {{{"authorization", "Basic YTpi"}}, 401, R"(Bearer realm="kdd")"},
+        {{{"authorization", "Bearer"}}, 401, R"(Bearer realm="kdd")"},
+        {{{"authorization", "Bearer secret"}}, 401, invalid + "cannot be read\""},
+        {{{"authorization", good.chopped(4)}}, 401, invalid},
+        {{{"authorization", good}, {"authorization", good}},
+         400,
+         R"(Bearer realm="kdd", error="invalid_request", error_description="There are several tokens")"},
+    };
+    for (const auto& each : kHeaders) {
+        const Http::Response response = answer(each.headers);
+        EXPECT_EQ(response.status, each.status) << each.challenge.constData();
+        EXPECT_TRUE(headerOf(response, "WWW-Authenticate").startsWith(each.challenge))
+            << each.challenge.constData();
+    }
+    mRequest.method = Http::Method::Post;
+    const Http::Response noRight = answer({{"authorization", good}});
+    EXPECT_EQ(noRight.status, 403);
+    EXPECT_TRUE(headerOf(noRight, "WWW-Authenticate").contains("insufficient_scope"));
+    EXPECT_EQ(noRight.caller, "anna");
+    // A bad one is told also where nobody would need one.
+    mRules.anyone = kAllRights;
+    EXPECT_EQ(status({{"authorization", "Bearer secret"}}), 401);
+    EXPECT_EQ(status({{"authorization", good}}), 200);
+    mRequest.isEncrypted = false;
+    EXPECT_EQ(status({{"authorization", good}}), 403);
+    for (const char* peer : {"127.0.0.1", "::1", "10.0.0.9"}) {
+        mRequest.peer = peer;
+        EXPECT_EQ(status({{"authorization", good}}), 200) << peer;
+    }
+}
+
+}  // namespace

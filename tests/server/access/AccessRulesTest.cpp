@@ -1,0 +1,97 @@
+#include "server/access/AccessRules.h"
+
+#include <QTemporaryDir>
+
+#include <gtest/gtest.h>
+
+using namespace Kdd;
+using namespace Kdd::Access;
+
+namespace
+{
+
+constexpr const char* kTokens = R"("issuer":"i","audience":"a","keys":"k","rights":[{"gives":["read"]}])";
+
+TEST(AccessRules, SayWhoMayWhat)
+{
+    AccessRules rules;
+    const Result result = AccessRules::parse(R"({
+        "tokens": {"issuer": "https://login", "audience": ["a", "b"], "keys": "/k.json", "leeway": 5, "keysAge": 60,
+                   "rights": [{"claim": "scope", "value": "x", "gives": ["read", "store"]}]},
+        "header": {"name": "X-User", "peers": ["127.0.0.1", "0::1"], "users": {"*": ["read"], "anna": ["correct"]}},
+        "certificates": {"caFile": "/ca.pem", "subjects": {"CN=scanner": ["store"]}},
+        "cors": {"origins": ["https://Viewer.example:8443"]},
+        "audit": "log"})",
+                                             rules);
+    ASSERT_EQ(result.text(), QString());
+    EXPECT_FALSE(rules.anyone);
+    EXPECT_EQ(rules.tokens->audiences.size(), 2);
+    EXPECT_EQ(rules.tokens->leeway.count() + rules.tokens->keysAge.count() + rules.tokens->keysKept.count(),
+              5 + 60 + 86400);
+    EXPECT_EQ(rules.tokens->rights.at(0).gives, Rights(Right::Read) | Right::Store);
+    EXPECT_EQ(rules.header->name, "x-user");
+    EXPECT_EQ(rules.header->peers.at(1), "::1");
+    EXPECT_EQ(rules.header->users.value("anna"), Rights(Right::Correct));
+    EXPECT_EQ(rules.certificates->subjects.value("CN=scanner"), Rights(Right::Store));
+    EXPECT_EQ(rules.origins.origins.at(0), "https://viewer.example:8443");
+    EXPECT_EQ(rules.audit, "log");
+}
+
+TEST(AccessRules, OpenNoDoorByASlip)
+{
+    const QByteArray tokens = QByteArray(R"({"tokens":{)") + kTokens;
+    const struct
+    {
+        QByteArray text;
+        const char* reason;
+    } kFiles[] = {
+        {"", "no JSON object"},
+        {"[]", "no JSON object"},
+        {R"({"anyone":[],"anyone":["read"]})", "says something twice"},
+        {"{}", "it lets nobody in"},
+        {R"({"anyone":[]})", "it lets nobody in"},
+        {R"({"anyone":["reed"]})", "anyone has a right that is none"},
+        {R"({"anyone":"read"})", "anyone is no list of rights"},
+        {R"({"Anyone":["read"]})", "Anyone is nothing that stands there"},
+        {tokens + R"(,"leaway":5}})", "tokens.leaway is nothing that stands there"},
+        {tokens + R"(,"leeway":-1}})", "tokens.leeway is no number of seconds"},
+        {tokens + R"(,"leeway":"60"}})", "tokens.leeway is no number of seconds"},
+        {tokens + R"(,"keysAge":3600,"keysKept":60}})", "tokens.keysKept is less than keysAge"},
+        {R"({"tokens":{"issuer":"i","audience":[],"keys":"k"}})", "tokens.audience is empty"},
+        {R"({"tokens":{"issuer":"i","audience":["a",""],"keys":"k"}})", "tokens.audience has something"},
+        {R"({"tokens":{"issuer":"","audience":"a","keys":"k"}})", "tokens.issuer is no text"},
+        {R"({"tokens":{"issuer":"i","audience":"a"}})", "tokens.keys is no text"},
+        {R"({"tokens":{"issuer":"i","audience":"a","keys":"k"}})", "tokens.rights is no list"},
+        {R"({"tokens":{"issuer":"i","audience":"a","keys":"k","rights":[{"claim":"c","gives":["read"]}]}})",
+         "tokens.rights.value is no text"},
+        {R"({"tokens":{"issuer":"i","audience":"a","keys":"k","rights":[{"give":["read"]}]}})",
+         "tokens.rights.gives is no list of rights"},
+        {R"({"tokens":[]})", "tokens is no object"},
+        {R"({"header":{"name":"X User","peers":["::1"],"users":{"*":["read"]}}})", "header.name is no name"},
+        {R"({"header":{"name":"X-User","peers":["proxy"],"users":{"*":["read"]}}})",
+         "header.peers has something"},
+        {R"({"header":{"name":"X-User","peers":["::1"],"users":{}}})", "header.users names nobody"},
+        {R"({"certificates":{"subjects":{"*":["read"]}}})", "certificates.caFile is no text"},
+        {R"({"anyone":["read"],"cors":{"origins":["*"]}})", "cors.origins has something that is no origin"},
+        {R"({"anyone":["read"],"cors":{"origins":["null"]}})",
+         "cors.origins has something that is no origin"},
+        {R"({"anyone":["read"],"cors":{"origins":["https://a/b"]}})", "cors.origins has something"},
+    };
+    for (const auto& each : kFiles) {
+        AccessRules rules;
+        const Result result = AccessRules::parse(each.text, rules);
+        EXPECT_NE(result.text().toStdString().find(each.reason), std::string::npos)
+            << each.text.toStdString() << ": " << result.text().toStdString();
+        EXPECT_FALSE(rules.anyone || rules.tokens || rules.header || rules.certificates);
+    }
+}
+
+TEST(AccessRules, NameTheFileThatIsNotThere)
+{
+    AccessRules rules;
+    const QTemporaryDir folder;
+    const QString path = folder.filePath(QStringLiteral("access.json"));
+    EXPECT_TRUE(AccessRules::read(path, rules).text().startsWith(path));
+}
+
+}  // namespace
