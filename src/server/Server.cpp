@@ -239,6 +239,11 @@ Result Server::start()
     return result;
 }
 
+Result Server::renewCertificate()
+{
+    return d->http.renewCertificate();
+}
+
 /// The watchers see it to its end.
 void Server::stop()
 {

@@ -47,7 +47,9 @@ struct HttpServer::Private
     std::vector<std::unique_ptr<SessionThread>> threads;
     WorkerThreads workers;
     SessionHost host;
-    std::unique_ptr<TlsContext> tls;
+    std::shared_ptr<TlsContext> tlsContext() const { return std::atomic_load(&tls); }
+
+    std::shared_ptr<TlsContext> tls;  // null without TLS; atomic, for it may be renewed
     std::unique_ptr<Listener> listener;
     std::size_t nextThread = 0;
     std::mutex mutex;
@@ -74,15 +76,16 @@ void HttpServer::Private::open(SessionThread& thread, int socket, const QByteArr
 {
     auto connection = std::make_shared<Connection>(thread.io, socket);
     std::unique_ptr<Transport> transport;
-    if (tls != nullptr && !isRefused)
-        transport = tls->accept(socket);
+    const std::shared_ptr<TlsContext> secure = tlsContext();
+    if (secure != nullptr && !isRefused)
+        transport = secure->accept(socket);
     else
         transport = std::make_unique<PlainTransport>(socket);
     const auto session =
         std::make_shared<Session>(host, std::move(connection), std::move(transport), peer,
                                   [this, &thread](Session& ended) { closed(thread, ended); });
     thread.sessions.emplace(session.get(), session);
-    if (host.stops || (isRefused && tls != nullptr))
+    if (host.stops || (isRefused && secure != nullptr))
         session->abort();
     else if (isRefused)
         session->refuse();
@@ -150,6 +153,17 @@ Result HttpServer::start()
     return {};
 }
 
+Result HttpServer::renewCertificate()
+{
+    Result result;
+    std::shared_ptr<TlsContext> renewed;
+    if (d->tlsContext() != nullptr)
+        renewed = TlsContext::make(d->host.settings.certificateFile, d->host.settings.keyFile, result);
+    if (renewed != nullptr)
+        std::atomic_store(&d->tls, renewed);
+    return result;
+}
+
 void HttpServer::stop()
 {
     if (!d->isStarted)
@@ -173,7 +187,7 @@ void HttpServer::stop()
 
 QByteArray HttpServer::address() const
 {
-    const char* const scheme = d->tls != nullptr ? "https://" : "http://";
+    const char* const scheme = d->tlsContext() != nullptr ? "https://" : "http://";
     return scheme + d->host.settings.address.text();
 }
 

@@ -4,14 +4,17 @@
 
 #include <QFile>
 
+#include <fcntl.h>
 #include <kddlib/ExResource.h>
 #include <kddlib/Kxg.h>
 #include <kddlib/LogFile.h>
 #include <kddlib/PathName.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <csignal>
 #include <cstdio>
+#include <functional>
 #include <memory>
 #include <thread>
 
@@ -35,26 +38,39 @@ struct ServeRequest
     QList<QByteArray> hosts;
 };
 
-/// While it lives the signals that end a process wait to be asked for, by threads that are started meanwhile too.
-class EndSignals
+/// Whether the process would go with a terminal that is closed. nohup has that signal ignored.
+bool belongsToTerminal()
+{
+    struct sigaction action = {};
+    const int terminal = ::open("/dev/tty", O_RDONLY | O_CLOEXEC | O_NOCTTY);
+    if (terminal >= 0)
+        ::close(terminal);
+    return terminal >= 0 && ::sigaction(SIGHUP, nullptr, &action) == 0 && action.sa_handler == SIG_DFL;
+}
+
+/// While it lives the signals that are meant for a server wait to be asked for, by threads that are started meanwhile too.
+class ServerSignals
 {
 public:
-    EndSignals()
+    ServerSignals()
     {
         sigemptyset(&mSignals);
         sigaddset(&mSignals, SIGINT);
         sigaddset(&mSignals, SIGTERM);
+        if (!belongsToTerminal())
+            sigaddset(&mSignals, SIGHUP);
         ::pthread_sigmask(SIG_BLOCK, &mSignals, &mFormer);
     }
-    ~EndSignals() { ::pthread_sigmask(SIG_SETMASK, &mFormer, nullptr); }
-    EndSignals(const EndSignals&) = delete;
-    EndSignals& operator=(const EndSignals&) = delete;
+    ~ServerSignals() { ::pthread_sigmask(SIG_SETMASK, &mFormer, nullptr); }
+    ServerSignals(const ServerSignals&) = delete;
+    ServerSignals& operator=(const ServerSignals&) = delete;
 
-    /// Returns with the first one; a second one ends the process.
-    void await() const
+    /// Returns with the first one that ends the process; a second one ends it at once.
+    void awaitEnd(const std::function<void()>& renew) const
     {
-        int signal = 0;
-        ::sigwait(&mSignals, &signal);
+        int signal = SIGHUP;
+        for (::sigwait(&mSignals, &signal); signal == SIGHUP; ::sigwait(&mSignals, &signal))
+            renew();
         std::signal(SIGINT, SIG_DFL);
         std::signal(SIGTERM, SIG_DFL);
         ::pthread_sigmask(SIG_UNBLOCK, &mSignals, nullptr);
@@ -171,12 +187,23 @@ void warnOfNoArchive()
         LogFile::warnf("There is no archive here yet: %s", qUtf8Printable(result.text()));
 }
 
+void renewCertificate(Server& server)
+{
+    if (!server.address().startsWith("https:"))
+        return LogFile::printf("There is no certificate to be read anew: TLS is not in use");
+    const Result result = server.renewCertificate();
+    if (result.bad())
+        LogFile::errorf("The former certificate stays in use: %s", qUtf8Printable(result.text()));
+    else
+        LogFile::printf("Certificate and key were read anew");
+}
+
 Outcome runServe(const GlobalOptions& options, const ServeRequest& request)
 {
     ServerSettings settings;
     if (!readSettings(request, settings))
         return Outcome::WrongUsage;
-    const EndSignals end;
+    const ServerSignals received;
     Result result;
     const std::unique_ptr<Server> server = Server::make(settings, result);
     if (server != nullptr)
@@ -187,7 +214,7 @@ Outcome runServe(const GlobalOptions& options, const ServeRequest& request)
     }
     warnOfNoArchive();
     tellAddress(options, *server);
-    end.await();
+    received.awaitEnd([&] { renewCertificate(*server); });
     server->stop();
     return Outcome::Done;
 }

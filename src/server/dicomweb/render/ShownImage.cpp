@@ -11,6 +11,7 @@
 #include <kddlib/KxDcmFileLoader.h>
 #include <kddlib/KxVolumeInfo.h>
 #include <kddlib/LogFile.h>
+#include <kddlib/PathName.h>
 #include <kddlib/PreviewGenerator.h>
 #include <kddlib/TagMap.h>
 
@@ -70,7 +71,9 @@ Verdict ShownImage::open(const ServedStudy& study, const QByteArray& key)
     const Verdict known = takeImage(study, key, origin, &shown);
     if (known.bad())
         return known;
-    mPath = QFile::decodeName(origin.path);
+    mPath = pathText(origin.path);
+    Result unopened;  // the loader tells the reason, too
+    mState = Http::OpenFile::open(origin.path, unopened);
     mFile = std::make_unique<KxDcmFileLoader>(KxDcmFileLoader::Mode::BoundedLocal);
     const OFCondition condition =
         mFile->loadFile(OFFilename(origin.path.constData()), EXS_Unknown, EGL_noChange, kLongestInMemory);
@@ -96,7 +99,25 @@ int ShownImage::frames() const
     return qMax<Sint32>(number, 1);
 }
 
+/// Long values are read by the file's name when they are asked for, which may be another file's by then.
+Verdict ShownImage::checkUnchanged() const
+{
+    Result result;
+    const auto now = Http::OpenFile::open(pathBytes(mPath), result);
+    if (mState != nullptr && now != nullptr && now->identity() == mState->identity())
+        return {};
+    LogFile::errorf("%s was changed while it was read", qUtf8Printable(mPath));
+    return {503, QStringLiteral("The instance's DICOM file is being changed; ask again")};
+}
+
 Verdict ShownImage::draw(int frame, const RenderRequest& rendering, QImage& picture) const
+{
+    const Verdict drawn = drawAsRead(frame, rendering, picture);
+    const Verdict unchanged = checkUnchanged();
+    return unchanged.bad() ? unchanged : drawn;
+}
+
+Verdict ShownImage::drawAsRead(int frame, const RenderRequest& rendering, QImage& picture) const
 {
     if (frames() == 0)
         return {404, QStringLiteral("The instance has no pixels")};
