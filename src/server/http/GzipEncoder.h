@@ -29,4 +29,7 @@ private:
     std::unique_ptr<Private> d;
 };
 
+/// The whole of a body.
+QByteArray gzipped(const QByteArray& bytes);
+
 }  // namespace Kdd::Http

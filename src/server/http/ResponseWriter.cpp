@@ -241,7 +241,7 @@ ResponseWriter::Step ResponseWriter::broken(const QString& fault)
 /// had.
 bool ResponseWriter::prepare(Transport& transport)
 {
-    mBlock.clear();
+    mBlock.resize(0);
     mBlockSent = 0;
     BodyPart& part = mResponse.body[mPart];
     bool isReady = true;
@@ -261,7 +261,7 @@ bool ResponseWriter::prepare(Transport& transport)
 void ResponseWriter::frame()
 {
     if (!mBlock.isEmpty())
-        mBlock = QByteArray::number(mBlock.size(), 16) + "\r\n" + mBlock + "\r\n";
+        mBlock.prepend(QByteArray::number(mBlock.size(), 16) + "\r\n").append("\r\n");
     if (isAtEnd())
         mBlock += "0\r\n\r\n";
 }
