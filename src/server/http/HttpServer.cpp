@@ -43,12 +43,12 @@ struct HttpServer::Private
     template <typename Each>
     void onSessions(Each each);
     bool awaitEnd(std::chrono::milliseconds time);
+    std::shared_ptr<TlsContext> readCertificate(Result& result) const;
+    std::shared_ptr<TlsContext> tlsContext() const { return std::atomic_load(&tls); }
 
     std::vector<std::unique_ptr<SessionThread>> threads;
     WorkerThreads workers;
     SessionHost host;
-    std::shared_ptr<TlsContext> tlsContext() const { return std::atomic_load(&tls); }
-
     std::shared_ptr<TlsContext> tls;  // null without TLS; atomic, for it may be renewed
     std::unique_ptr<Listener> listener;
     std::size_t nextThread = 0;
@@ -115,6 +115,12 @@ void HttpServer::Private::onSessions(Each each)
     }
 }
 
+std::shared_ptr<TlsContext> HttpServer::Private::readCertificate(Result& result) const
+{
+    const HttpSettings& settings = host.settings;
+    return TlsContext::make(settings.certificateFile, settings.keyFile, settings.clientCaFile, result);
+}
+
 /// Whether all sessions came to their end.
 bool HttpServer::Private::awaitEnd(std::chrono::milliseconds time)
 {
@@ -138,7 +144,7 @@ Result HttpServer::start()
     HttpSettings& settings = d->host.settings;
     if (!settings.certificateFile.isEmpty()) {
         Result result;
-        d->tls = TlsContext::make(settings.certificateFile, settings.keyFile, settings.clientCaFile, result);
+        d->tls = d->readCertificate(result);
         if (result.bad())
             return result;
     }
@@ -158,7 +164,7 @@ Result HttpServer::renewCertificate()
     Result result;
     std::shared_ptr<TlsContext> renewed;
     if (d->tlsContext() != nullptr)
-        renewed = TlsContext::make(d->host.settings.certificateFile, d->host.settings.keyFile, result);
+        renewed = d->readCertificate(result);
     if (renewed != nullptr)
         std::atomic_store(&d->tls, renewed);
     return result;
