@@ -40,7 +40,7 @@ std::vector<std::unique_ptr<DicomWeb::Resource>> makeResources(ServedArchive& ar
     resources.push_back(std::make_unique<InstancesResource>(archive.studies, archive.objects));
     resources.push_back(std::make_unique<BulkDataResource>(archive.studies, archive.objects));
     resources.push_back(std::make_unique<ThumbnailResource>(*archive.studies));
-    resources.push_back(std::make_unique<RenderedResource>(*archive.studies));
+    resources.push_back(std::make_unique<RenderedResource>(*archive.studies, *archive.objects));
     return resources;
 }
 

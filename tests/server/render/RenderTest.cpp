@@ -78,6 +78,12 @@ protected:
         return response.body.empty() ? QByteArray() : std::get<QByteArray>(response.body.front());
     }
 
+    static qint64 sizeOf(const Http::Response& response)
+    {
+        const auto* range = std::get_if<Http::FileRange>(&response.body.front());
+        return range != nullptr ? range->length : body(response).size();
+    }
+
     QImage picture(const QByteArray& what, QVector<Http::Field> query = {})
     {
         const Http::Response response = ask(what, std::move(query));
@@ -88,7 +94,8 @@ protected:
     TemporaryStore mStore;
     LogCapture mLog;
     StudyShelf mShelf{1 << 30, std::chrono::nanoseconds(-1'000'000'000)};
-    RenderedResource mRendered{mShelf};
+    ObjectShelf mObjects{1 << 20};
+    RenderedResource mRendered{mShelf, mObjects};
     ThumbnailResource mThumbnail{mShelf};
     QByteArray mFile;
 };
@@ -209,6 +216,40 @@ TEST_F(RenderTest, MakesThumbnailsOfWhatIsStoredWhereThatDoes)
     EXPECT_EQ(QImage::fromData(body(ask("thumbnail", {{"viewport", "32,32"}}, "image/jpeg"))).size(),
               QSize(32, 16));
     EXPECT_EQ(QImage::fromData(body(ask("frames/2/thumbnail", {}, "image/jpeg"))).size(), QSize(256, 256));
+}
+
+TEST_F(RenderTest, GivesDocumentsAsTheyAreStored)
+{
+    const QByteArray document("%PDF-1.4 " + QByteArray(70000, 'x'));
+    const auto aDocument = [&](const char* type) {
+        DatasetBuilder image = anImage("1.4").inStudy("1.2").inSeries("1.3");
+        image.with(DCM_MIMETypeOfEncapsulatedDocument, type);
+        image.dataset().putAndInsertUint8Array(DCM_EncapsulatedDocument,
+                                               reinterpret_cast<const Uint8*>(document.constData()),
+                                               static_cast<unsigned long>(document.size()));
+        return image;
+    };
+    const struct
+    {
+        const char* type;
+        const char* accept;
+        int status;
+        const char* given;
+    } cases[] = {
+        {"application/pdf", "text/html,application/xml;q=0.9,*/*;q=0.8", 200, "application/pdf"},
+        {"application/pdf", "image/jpeg", 406, "text/plain; charset=utf-8"},
+        // A browser would run what it is told to be a page.
+        {"text/html", "*/*", 200, "application/octet-stream"},
+    };
+    for (const auto& each : cases) {
+        store(aDocument(each.type));
+        const Http::Response response = ask("rendered", {}, each.accept);
+        EXPECT_EQ(response.status, each.status) << each.type;
+        EXPECT_EQ(response.headers.first().value, each.given) << each.type;
+        if (response.status == 200) {
+            EXPECT_EQ(sizeOf(response), document.size() + document.size() % 2);
+        }
+    }
 }
 
 }  // namespace

@@ -2,6 +2,7 @@
 
 #include "server/dicomweb/render/PictureForm.h"
 #include "server/dicomweb/render/ShownImage.h"
+#include "server/dicomweb/render/StoredView.h"
 #include "server/dicomweb/retrieve/EntriesProducer.h"
 #include "server/dicomweb/retrieve/ImageFinder.h"
 #include "server/http/MultipartWriter.h"
@@ -144,8 +145,6 @@ Http::Response RenderedResource::answer(const Http::Request& request, const Reso
     QVector<ListedImage> images;
     Verdict verdict = RenderRequest::parse(request, rendering);
     if (verdict.good())
-        verdict = PictureForm::choose(Http::AcceptHeader::of(request), form);
-    if (verdict.good())
         verdict = framesOf(path, frames);
     if (verdict.good())
         verdict = findStudy(mStudies, path, study);
@@ -154,6 +153,13 @@ Http::Response RenderedResource::answer(const Http::Request& request, const Reso
     if (verdict.bad())
         return verdict.response();
 
+    if (!path.instance.isEmpty() && frames.isEmpty()) {
+        if (auto stored = answerAsStored(request, *study, images.first(), mObjects))
+            return std::move(*stored);
+    }
+    verdict = PictureForm::choose(Http::AcceptHeader::of(request), form);
+    if (verdict.bad())
+        return verdict.response();
     if (form.isMultipart) {
         QVector<Wanted> wanted;
         verdict = listWanted(*study, images, frames, wanted);
