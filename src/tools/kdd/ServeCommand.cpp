@@ -131,7 +131,7 @@ bool readSettings(const ServeRequest& request, ServerSettings& settings)
     return true;
 }
 
-void tellAddress(const GlobalOptions& options, const Server& server)
+void tellAddress(const GlobalOptions& options, const Server& server, bool hasViewer)
 {
     const QString address = QString::fromLatin1(server.address());
     const QString status = QString::fromLatin1(server.statusAddress());
@@ -139,6 +139,8 @@ void tellAddress(const GlobalOptions& options, const Server& server)
         printJson({{QStringLiteral("address"), address}, {QStringLiteral("status"), status}});
     } else {
         std::printf("Serving at %s\n", qUtf8Printable(address));
+        if (hasViewer)
+            std::printf("Viewer at %s/viewer/\n", qUtf8Printable(address));
         if (!status.isEmpty())
             std::printf("Watched at %s\n", qUtf8Printable(status));
     }
@@ -159,6 +161,7 @@ Outcome runServe(const GlobalOptions& options, const ServeRequest& request)
     if (!readSettings(request, settings))
         return Outcome::WrongUsage;
     const EndSignals end;
+    const bool hasViewer = !settings.viewer.isEmpty();
     Result result;
     const std::unique_ptr<Server> server = Server::make(settings, result);
     if (server != nullptr)
@@ -168,7 +171,7 @@ Outcome runServe(const GlobalOptions& options, const ServeRequest& request)
         return Outcome::Failed;
     }
     warnOfNoArchive();
-    tellAddress(options, *server);
+    tellAddress(options, *server, hasViewer);
     end.await();
     server->stop();
     return Outcome::Done;
