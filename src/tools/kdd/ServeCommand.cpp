@@ -165,7 +165,7 @@ bool readSettings(const ServeRequest& request, ServerSettings& settings)
     return true;
 }
 
-void tellAddress(const GlobalOptions& options, const Server& server)
+void tellAddress(const GlobalOptions& options, const Server& server, bool hasViewer)
 {
     const QString address = QString::fromLatin1(server.address());
     const QString status = QString::fromLatin1(server.statusAddress());
@@ -173,6 +173,8 @@ void tellAddress(const GlobalOptions& options, const Server& server)
         printJson({{QStringLiteral("address"), address}, {QStringLiteral("status"), status}});
     } else {
         std::printf("Serving at %s\n", qUtf8Printable(address));
+        if (hasViewer)
+            std::printf("Viewer at %s/viewer/\n", qUtf8Printable(address));
         if (!status.isEmpty())
             std::printf("Watched at %s\n", qUtf8Printable(status));
     }
@@ -204,6 +206,7 @@ Outcome runServe(const GlobalOptions& options, const ServeRequest& request)
     if (!readSettings(request, settings))
         return Outcome::WrongUsage;
     const ServerSignals received;
+    const bool hasViewer = !settings.viewer.isEmpty();
     Result result;
     const std::unique_ptr<Server> server = Server::make(settings, result);
     if (server != nullptr)
@@ -213,7 +216,7 @@ Outcome runServe(const GlobalOptions& options, const ServeRequest& request)
         return Outcome::Failed;
     }
     warnOfNoArchive();
-    tellAddress(options, *server);
+    tellAddress(options, *server, hasViewer);
     received.awaitEnd([&] { renewCertificate(*server); });
     server->stop();
     return Outcome::Done;
