@@ -32,7 +32,7 @@ ARROWS = {
     "sample": ["platform/base"],
     "public headers": [],
     "server/http": ["public headers"],
-    "server/access": ["server/http"],
+    "server/access": ["server/dicomweb"],
     "server/dicomweb": ["server/http"],
     "server/browser": ["server/dicomweb"],
     "server": ["server/access", "server/browser"],
