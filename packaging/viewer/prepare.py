@@ -6,6 +6,7 @@ usage: prepare.py PACKAGE.tgz FOLDER
 FOLDER receives the viewer's static files and our configuration of it; what was there is replaced.
 """
 
+import gzip
 import os
 import re
 import shutil
@@ -15,10 +16,11 @@ import tarfile
 PREFIX = "package/dist/"
 OWN = os.path.dirname(os.path.abspath(__file__))
 
-# Where the page names its files, where its program does, and where its style sheets do.
+# Where the page names its files, where its program does, its style sheets do, and what a browser is told of its icons.
 ROOTS = {
     ".html": [(r'((?:src|href|content)="|PUBLIC_URL = \')/(?!/)', r"\1/viewer/")],
     ".js": [(r'(__webpack_require__\.p = ")/"', r'\1/viewer/"')],
+    ".json": [(r'("(?:src|start_url|scope)": ?")/(?!/)', r"\1/viewer/")],
     ".css": [(r"(url\(['\"]?)/(?!/)", r"\1/viewer/")],
 }
 
@@ -56,6 +58,15 @@ def move_root(folder):
     return changes
 
 
+def compress(folder):
+    """Puts beside each large text what a browser far away gets in its place."""
+    for name in os.listdir(folder):
+        path = os.path.join(folder, name)
+        if os.path.splitext(name)[1] in (".js", ".css", ".wasm", ".json") and os.path.getsize(path) > 16384:
+            with open(path, "rb") as source, gzip.open(path + ".gz", "wb", 6) as target:
+                shutil.copyfileobj(source, target)
+
+
 def main():
     package, folder = sys.argv[1:]
     folder = os.path.abspath(folder)
@@ -65,6 +76,7 @@ def main():
     if move_root(folder) == 0:
         sys.exit(f"{package} does not name its files as expected; it would not be found under /viewer")
     shutil.copy(os.path.join(OWN, "app-config.js"), folder)
+    compress(folder)
 
 
 if __name__ == "__main__":

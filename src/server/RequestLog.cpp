@@ -16,8 +16,9 @@ namespace
 constexpr int kLongestTarget = 1000;  // [bytes]
 
 /// Resources by which requests are counted; what a client makes up is "other".
-constexpr const char* kGroups[] = {"bulkdata",  "changefeed", "frames", "instances", "metadata",  "patients",
-                                   "pixeldata", "rendered",   "series", "studies",   "thumbnail", "volumes"};
+constexpr const char* kGroups[] = {"bulkdata",  "changefeed", "frames",   "instances", "metadata",
+                                   "patients",  "pixeldata",  "rendered", "series",    "studies",
+                                   "thumbnail", "volumes",    "wado"};
 
 const char* methodText(Http::Method method)
 {
@@ -57,7 +58,7 @@ QByteArray RequestLog::groupOf(const QVector<QByteArray>& path) const
     if (path.isEmpty())
         return "page";
     if (path.mid(0, mPrefix.size()) != mPrefix)
-        return path[0] == "viewer" ? "viewer" : "other";
+        return path[0] == "viewer" || path[0] == "wado" ? path[0] : QByteArray("other");
     DicomWeb::ResourcePath resource;
     if (!DicomWeb::ResourcePath::parse(path.mid(mPrefix.size()), resource))
         return "other";

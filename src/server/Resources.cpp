@@ -8,6 +8,7 @@
 #include "server/dicomweb/retrieve/InstancesResource.h"
 #include "server/dicomweb/search/ChangeFeed.h"
 #include "server/dicomweb/search/SearchResource.h"
+#include "server/dicomweb/uri/UriResource.h"
 
 #include <kddlib/ExResource.h>
 #include <kddlib/PathName.h>
@@ -39,8 +40,16 @@ std::vector<std::unique_ptr<DicomWeb::Resource>> makeResources(ServedArchive& ar
     resources.push_back(std::make_unique<ChangeFeed>(archive.database));
     resources.push_back(std::make_unique<InstancesResource>(archive.studies, archive.objects));
     resources.push_back(std::make_unique<BulkDataResource>(archive.studies, archive.objects));
-    resources.push_back(std::make_unique<ThumbnailResource>(*archive.studies));
-    resources.push_back(std::make_unique<RenderedResource>(*archive.studies));
+    resources.push_back(std::make_unique<ThumbnailResource>(archive.studies, archive.objects));
+    resources.push_back(std::make_unique<RenderedResource>(archive.studies, archive.objects));
+    resources.push_back(std::make_unique<UriResource>(archive.studies, archive.objects));
+    return resources;
+}
+
+std::vector<std::unique_ptr<DicomWeb::Resource>> makeUriResources(ServedArchive& archive)
+{
+    std::vector<std::unique_ptr<DicomWeb::Resource>> resources;
+    resources.push_back(std::make_unique<DicomWeb::UriResource>(archive.studies, archive.objects));
     return resources;
 }
 

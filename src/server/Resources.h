@@ -26,4 +26,7 @@ struct ServedArchive
 /// archive outlives them.
 std::vector<std::unique_ptr<DicomWeb::Resource>> makeResources(ServedArchive& archive);
 
+/// What answers beside that prefix, under the one path that older viewers know.
+std::vector<std::unique_ptr<DicomWeb::Resource>> makeUriResources(ServedArchive& archive);
+
 }  // namespace Kdd

@@ -22,6 +22,7 @@ namespace
 {
 
 const QByteArray kViewerPath = "/viewer";
+const QByteArray kUriPath = "/wado";
 
 /// Watching takes little; its own threads answer when those of the others are all busy.
 Http::HttpSettings statusSettings(const ServerSettings& settings)
@@ -163,6 +164,8 @@ struct Server::Private
     {
         router.add(prefix,
                    std::make_unique<DicomWeb::DicomWebService>(prefix.size(), makeResources(archive)));
+        router.add(Router::segmentsOf(kUriPath),
+                   std::make_unique<DicomWeb::DicomWebService>(0, makeUriResources(archive)));
         Browser::BrowserSettings browser;
         browser.dicomWeb = prefix.toList().join('/');
         browser.hasViewer = !settings.viewer.isEmpty();
@@ -234,6 +237,11 @@ Result Server::start()
     if (result.bad())
         stop();
     return result;
+}
+
+Result Server::renewCertificate()
+{
+    return d->http.renewCertificate();
 }
 
 /// The watchers see it to its end.

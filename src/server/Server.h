@@ -40,6 +40,9 @@ public:
     /// On failure nothing has begun.
     Result start();
 
+    /// Has connections from here on meet the certificate and key that the files hold now. On failure the former ones stay.
+    Result renewCertificate();
+
     /// Returns when the requests in flight are answered, or their time is over.
     void stop();
 

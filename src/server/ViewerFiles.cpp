@@ -1,5 +1,7 @@
 #include "server/ViewerFiles.h"
 
+#include "server/http/AcceptHeader.h"
+
 #include <QCryptographicHash>
 #include <QFile>
 
@@ -52,6 +54,11 @@ const char* mediaTypeOf(const QByteArray& name)
     return nullptr;
 }
 
+const char* typeOrBytes(const char* type)
+{
+    return type != nullptr ? type : "application/octet-stream";
+}
+
 /// Without links and "..", null when it does not lead to anything.
 QByteArray realPath(const QByteArray& path)
 {
@@ -77,7 +84,7 @@ Http::Response toFolder(const Http::Request& request)
 }
 
 Http::Response fileResponse(const Http::Request& request, std::shared_ptr<const Http::OpenFile> file,
-                            const char* mediaType)
+                            const char* mediaType, const char* coding = nullptr)
 {
     const QByteArray hash = QCryptographicHash::hash(file->identity(), QCryptographicHash::Sha1).toHex();
     const QByteArray tag = '"' + hash + '"';
@@ -86,9 +93,12 @@ Http::Response fileResponse(const Http::Request& request, std::shared_ptr<const 
     response.addHeader("ETag", tag);
     // To be asked for each time, so that a new release of the viewer is not mixed with the old one.
     response.addHeader("Cache-Control", "no-cache");
+    response.addHeader("Vary", "Accept-Encoding");
     if (isKnown)
         return response;
     response.addHeader("Content-Type", mediaType);
+    if (coding != nullptr)
+        response.addHeader("Content-Encoding", coding);
     const qint64 size = file->size();
     response.body.emplace_back(Http::FileRange{std::move(file), 0, size});
     return response;
@@ -128,8 +138,14 @@ Http::Response ViewerFiles::answer(const Http::Request& request)
         return toFolder(request);
     const char* const type = segments.isEmpty() ? nullptr : mediaTypeOf(segments.last());
     std::shared_ptr<const Http::OpenFile> file = segments.isEmpty() ? nullptr : find(segments);
+    if (file != nullptr && Http::acceptsCoding(request, "gzip")) {
+        QVector<QByteArray> compressed = segments;
+        compressed.last() += ".gz";
+        if (auto shorter = find(compressed))
+            return fileResponse(request, std::move(shorter), typeOrBytes(type), "gzip");
+    }
     if (file != nullptr)
-        return fileResponse(request, std::move(file), type != nullptr ? type : "application/octet-stream");
+        return fileResponse(request, std::move(file), typeOrBytes(type));
     file = type == nullptr ? find({kStartPage}) : nullptr;
     if (file != nullptr)
         return fileResponse(request, std::move(file), mediaTypeOf(kStartPage));

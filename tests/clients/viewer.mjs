@@ -1,69 +1,147 @@
-// Opens studies in a viewer's page under headless Chromium: the list, and a picture that is not blank of each study named.
+// Opens studies of each kind in a viewer's page under headless Chromium, as readers do, and looks at what is shown. Answers
+// that failed, errors of the page's programs and dialogs that tell of failures are faults.
 //
-// usage: node viewer.mjs http://HOST:PORT FOLDER STUDY...      FOLDER receives screenshots
+// usage: node viewer.mjs http://localhost:PORT FOLDER [KIND...]      FOLDER receives screenshots
 
 import { createRequire } from 'node:module';
-import { check, report, root } from './archive.mjs';
+import { check, report, root, value } from './archive.mjs';
 
 const require = createRequire(process.env.KDD_NODE_MODULES + '/');
 const puppeteer = require('puppeteer-core');
-const [folder, ...studies] = process.argv.slice(3);
+const [folder, ...chosen] = process.argv.slice(3);
 
 // More than the slowest machine needs; nothing waits for it to pass.
-const kPatience = { timeout: 120000 };
+const kPatience = 180000;
+const kUrl = 'viewer?StudyInstanceUIDs=';
+
+// What is asked for, and what has to be seen of it. `series` is opened by two clicks, for kinds that are not what comes first.
+const kinds = [
+  { name: 'ct', query: 'PatientID=VIEWER-CT', sees: 'picture' },
+  { name: 'seg', query: 'PatientID=VIEWER-CT', series: 'SEG', sees: 'colour' },
+  { name: 'mpr', query: 'ModalitiesInStudy=MR&PatientName=*', mode: '&hangingprotocolId=mpr', sees: 'picture', viewports: 3 },
+  { name: 'pet', query: 'PatientID=VIEWER-PT', sees: 'picture' },
+  { name: 'us', query: 'PatientID=VIEWER-US', sees: 'colour' },
+  { name: 'xa', query: 'PatientID=VIEWER-XA', sees: 'picture' },
+  { name: 'ecg', query: 'PatientID=VIEWER-ECG', sees: 'colour' },
+  { name: 'pdf', query: 'PatientID=VIEWER-DOC', sees: 'document' },
+  { name: 'sr', query: 'ModalitiesInStudy=SR&PatientName=*', series: 'SR', sees: 'text' },
+];
+
+// Searches as the list writes them into its address, and who has to be the only one left.
+const searches = [
+  ['patientName=viewer', 'Viewer,'],
+  ['patientName=観察^太', 'Viewer, PT'],
+  ['mrn=VIEWER-XA', 'Viewer, XA'],
+  ['accession=ACC-5', 'Viewer, ECG'],
+  ['description=trial of PT', 'Viewer, PT'],
+  ['modalities=ECG', 'Viewer, ECG'],
+  ['startDate=20260301&endDate=20260301', 'Viewer,'],
+];
+
+/// In the page: notes when the first viewport shows something, by its own clock [ms].
+function watchPictures() {
+  localStorage.setItem('shownTours', '["basicViewerTour"]');
+  const small = document.createElement('canvas');
+  small.width = small.height = 64;
+  const context = small.getContext('2d', { willReadFrequently: true });
+  /// Of each viewport how far its grey values reach, and how many of its pixels have a colour.
+  window.looks = () => [...document.querySelectorAll('.cornerstone-canvas, .viewport-element canvas')].map((canvas) => {
+    context.clearRect(0, 0, 64, 64);
+    context.drawImage(canvas, 0, 0, 64, 64);
+    const { data } = context.getImageData(0, 0, 64, 64);
+    const look = { least: 255, most: 0, colours: 0 };
+    for (let i = 0; i < data.length; i += 4) {
+      const [red, green, blue] = data.slice(i, i + 3);
+      look.least = Math.min(look.least, green);
+      look.most = Math.max(look.most, green);
+      if (Math.max(red, green, blue) - Math.min(red, green, blue) > 30) ++look.colours;
+    }
+    return look;
+  });
+  const timer = setInterval(() => {
+    if (!window.looks().some(({ least, most }) => most - least > 40)) return;
+    window.firstPicture = performance.now();
+    clearInterval(timer);
+  }, 25);
+}
+
+/// In the page, whether it shows what is to be seen.
+const sights = {
+  picture: (viewports) => window.looks().filter(({ least, most }) => most - least > 40).length >= viewports,
+  colour: () => window.looks().some(({ colours }) => colours > 4),
+  document: () => document.querySelector('object[data], iframe[src], embed[src]') !== null,
+  text: () => /Findings|Measurement|Report|Content/i.test(document.querySelector('[data-cy="viewport-pane"], [data-viewportid]')?.innerText ?? ''),
+};
 
 const browser = await puppeteer.launch({
   executablePath: process.env.CHROMIUM ?? '/usr/bin/chromium',
   // Nothing but this machine can be reached, at a place of care too.
   args: ['--no-sandbox', '--host-resolver-rules=MAP * ~NOTFOUND, EXCLUDE localhost, EXCLUDE 127.0.0.1', '--use-gl=angle', '--use-angle=swiftshader', '--enable-unsafe-swiftshader'],
+  protocolTimeout: 2 * kPatience,
 });
-const page = await browser.newPage();
-await page.setViewport({ width: 1400, height: 900 });
-page.setDefaultNavigationTimeout(kPatience.timeout);
-const failed = [];
-page.on('response', answer => {
-  if (answer.status() >= 400) failed.push(`${answer.status()} ${answer.url()}`);
-});
-page.on('requestfailed', request => console.log('unreachable', request.url().slice(0, 120), request.failure()?.errorText));
-page.on('pageerror', error => failed.push(String(error)));
 
-/// Whether a viewport shows something: grey values that differ.
-async function hasPicture() {
-  return page.evaluate(() => [...document.querySelectorAll('canvas')].some(canvas => {
-    const small = document.createElement('canvas');
-    small.width = small.height = 32;
-    const context = small.getContext('2d');
-    context.drawImage(canvas, 0, 0, 32, 32);
-    const { data } = context.getImageData(0, 0, 32, 32);
-    let least = 255;
-    let most = 0;
-    for (let i = 0; i < data.length; i += 4) {
-      least = Math.min(least, data[i]);
-      most = Math.max(most, data[i]);
-    }
-    return most - least > 40;
-  }));
+/// A new page whose faults are told under the name.
+async function newPage(name) {
+  const page = await browser.newPage();
+  await page.setViewport({ width: 1400, height: 900 });
+  page.setDefaultTimeout(kPatience);
+  page.on('response', (answer) => check(answer.status() < 400, `${name}: ${answer.status()} ${answer.url()}`));
+  page.on('pageerror', (error) => check(false, `${name}: ${error}`));
+  page.on('console', (message) => check(message.type() !== 'error', `${name}: ${message.text().slice(0, 300)}`));
+  page.on('dialog', (dialog) => check(false, `${name}: ${dialog.message()}`) ?? dialog.dismiss());
+  await page.evaluateOnNewDocument(watchPictures);
+  return page;
 }
 
-await page.goto(`${root}/viewer/`, { waitUntil: 'domcontentloaded' });
-await page.waitForFunction(() => /\d+ ?- ?\d+ of|Number of studies|Studies/i.test(document.body.innerText), kPatience)
-  .catch(() => check(false, 'the list of studies does not appear'));
-await new Promise(done => setTimeout(done, 1500));
-await page.screenshot({ path: `${folder}/viewer-list.png` });
-const rows = await page.$$eval('[data-cy="study-list-results"] tr, [data-cy="studyRow"]', found => found.length).catch(() => 0);
-console.log(`${rows} rows in the list`);
+/// How long the first picture took, and how much of that the requests of data from the first to its frame.
+const timing = () => {
+  const asked = performance.getEntriesByType('resource').filter((one) => one.name.includes('/dicom-web/'));
+  const frame = asked.find((one) => one.name.includes('/frames/'));
+  if (!window.firstPicture || !frame) return '';
+  const busy = asked.filter((one) => one.startTime <= frame.startTime && /metadata|series|studies\?|frames/.test(one.name));
+  const longest = busy.reduce((most, one) => (one.duration > most.duration ? one : most));
+  const round = Math.round;
+  return `first picture ${round(window.firstPicture)} ms; first request at ${round(asked[0].startTime)}, first frame asked for at `
+    + `${round(frame.startTime)}, there at ${round(frame.responseEnd)}; longest answer ${round(longest.duration)} ms`;
+};
 
-for (const study of studies) {
-  const before = failed.length;
-  await page.goto(`${root}/viewer/viewer?StudyInstanceUIDs=${study}`, { waitUntil: 'domcontentloaded' });
-  let isShown = false;
-  for (let round = 0; round < 120 && !isShown; ++round) {
-    await new Promise(done => setTimeout(done, 500));
-    isShown = await hasPicture().catch(() => false);
+async function openKind({ name, query, mode = '', series, sees, viewports = 1 }) {
+  const answer = await fetch(`${root}/dicom-web/studies?${query}&limit=1`);
+  const study = value((await answer.json())[0], '0020000D');
+  if (!study) return check(false, `${name}: the archive has no such study`);
+  const page = await newPage(name);
+  await page.goto(`${root}/viewer/${kUrl}${study}${mode}`, { waitUntil: 'domcontentloaded' });
+  if (series) {
+    const entry = await page.waitForFunction((modality) => [...document.querySelectorAll('[data-cy^="study-browser-thumbnail"]')]
+      .find((one) => one.innerText.trim().startsWith(modality)), {}, series);
+    await entry.click({ count: 2 });
   }
-  await page.screenshot({ path: `${folder}/viewer-${study}.png` });
-  check(isShown, `no picture of ${study}`);
-  check(failed.length === before, `${study}: ${failed.slice(before).join('\n  ')}`);
+  await page.waitForFunction(sights[sees], { polling: 100 }, viewports).catch(() => check(false, `${name}: nothing is shown`));
+  // A document's own viewer keeps its request.
+  await page.waitForNetworkIdle({ idleTime: 500, concurrency: 1 }).catch(() => check(false, `${name}: requests do not end`));
+  const told = await page.evaluate(() => document.body.innerText.match(/[^\n]*(not available|went wrong|failed|error)[^\n]*/i)?.[0]);
+  check(!told, `${name}: "${told}" is shown`);
+  await page.screenshot({ path: `${folder}/${name}.png` });
+  console.log(name.padEnd(6), await page.evaluate(timing));
+  await page.close();
 }
+
+/// The list of studies, searched by each of its fields.
+async function searchList() {
+  const page = await newPage('list');
+  for (const [query, left] of searches) {
+    await page.goto(`${root}/viewer/?${encodeURI(query)}`, { waitUntil: 'domcontentloaded' });
+    await page.waitForFunction((who) => {
+      const rows = [...document.querySelectorAll('tbody tr')].map((one) => one.innerText.trim()).filter((one) => !/^(Reset)?$/.test(one));
+      return rows.length > 0 && rows.every((one) => one.startsWith(who));
+    }, { polling: 100, timeout: kPatience / 3 }, left).catch(() => check(false, `list: ${query} does not leave ${left} alone`));
+  }
+  await page.screenshot({ path: `${folder}/list.png` });
+  await page.close();
+}
+
+if (chosen.length === 0 || chosen.includes('list')) await searchList();
+const opened = kinds.filter(({ name }) => chosen.length === 0 || chosen.includes(name));
+for (const kind of opened) await openKind(kind).catch((error) => check(false, `${kind.name}: ${error.message}`));
 await browser.close();
-report(`${studies.length} studies`);
+report(`${opened.length + 1} kinds`);

@@ -25,6 +25,8 @@ protected:
         write("viewer/app.js", "program");
         write("viewer/assets/a b.svg", "picture");
         write("viewer/assets/data", "data");
+        write("viewer/large.js", "program");
+        write("viewer/large.js.gz", "shorter");
         link("app.js", "viewer/inside.js");
         link("../secret.txt", "viewer/outside.txt");
         link("..", "viewer/up");
@@ -58,12 +60,12 @@ protected:
         return mFiles->answer(request);
     }
 
-    /// "200 text/css content"
+    /// "200 text/css gzip content"
     static std::string shown(const Http::Response& response)
     {
         QByteArray text = QByteArray::number(response.status);
         for (const Http::Field& field : response.headers)
-            if (field.name == "Content-Type" || field.name == "Location")
+            if (field.name == "Content-Type" || field.name == "Content-Encoding" || field.name == "Location")
                 text += ' ' + field.value.split(';')[0];
         for (const Http::BodyPart& part : response.body) {
             QByteArray bytes;
@@ -114,6 +116,17 @@ TEST_F(ViewerFilesTest, AreThoseBelowTheFolderAndNoOthers)
         const std::string answer = shown(get(each.target));
         EXPECT_EQ(answer.substr(0, answer.find(" The viewer")), each.answer) << each.target;
     }
+}
+
+TEST_F(ViewerFilesTest, AreSentCompressedToWhoTakesThemSo)
+{
+    const auto sent = [&](const char* target, const char* coding) {
+        return shown(get(target, {{"accept-encoding", coding}}));
+    };
+    EXPECT_EQ(sent("/viewer/large.js", "gzip, br"), "200 text/javascript gzip shorter");
+    EXPECT_EQ(sent("/viewer/large.js", "br"), "200 text/javascript program");
+    EXPECT_EQ(sent("/viewer/large.js", "gzip;q=0"), "200 text/javascript program");
+    EXPECT_EQ(sent("/viewer/app.js", "gzip"), "200 text/javascript program");
 }
 
 TEST_F(ViewerFilesTest, AreNotSentAgainToWhoHasThem)

@@ -76,6 +76,9 @@ void FileRegistration::run(const FileRecords& files, RegistrationOutcome& outcom
     // Without any, no file has to be looked up.
     if (hasCorrections(mConnection))
         followCorrections(entries);
+    // From here on they are compared with those that are stored.
+    for (Entry& entry : entries)
+        entry.sopUID = textValue(entry.sopUID).toString().toUtf8();
     // Given out by path: of several new files of one image the last by path is the one that is shown.
     mNumber = takeRegistrationNumbers(mConnection, static_cast<qint64>(entries.size()));
     for (auto from = entries.begin(); from != entries.end();) {

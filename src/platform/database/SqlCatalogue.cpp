@@ -213,26 +213,27 @@ Kdd::Result SqlCatalogue::corrections(const QByteArray& studyUID, std::vector<Im
 Kdd::Result SqlCatalogue::studyContents(const QByteArray& studyUID, StudyContents& contents)
 {
     return transact(Access::Read, [&] {
-        contents = {};
+        StudyContents found;
         const qint64 studyId = findStudyId(mConnection, studyUID);
-        contents.id = static_cast<int>(studyId);
-        contents.images = listImages(mConnection, studyId);
-        contents.volumes = pathsOf(listVolumes(mConnection, studyId));
-        contents.isCorrected = !correctionsOf(mConnection, studyUID).empty();
+        found.id = static_cast<int>(studyId);
+        found.images = listImages(mConnection, studyId);
+        found.volumes = pathsOf(listVolumes(mConnection, studyId));
+        found.isCorrected = !correctionsOf(mConnection, studyUID).empty();
         SqlRows rows =
             mConnection.ask("SELECT tag_file_size, tag_file_digest,"
                             " EXISTS (SELECT 1 FROM build_request WHERE study_id = study.id AND due <= ?)"
                             " FROM study WHERE id = ?",
                             {presentMs(), studyId});
         if (rows.next()) {
-            contents.tagFile = {rows.number(0), rows.bytes(1)};
-            contents.isWaiting = rows.truth(2);
+            found.tagFile = {rows.number(0), rows.bytes(1)};
+            found.isWaiting = rows.truth(2);
         }
         // What waits to settle is due at a time and not at 0.
         SqlRows changes = mConnection.ask(
             "SELECT id FROM build_request WHERE study_id = ? AND due = 0 ORDER BY id", {studyId});
         while (changes.next())
-            contents.changes.push_back(changes.number(0));
+            found.changes.push_back(changes.number(0));
+        contents = std::move(found);
     });
 }
 

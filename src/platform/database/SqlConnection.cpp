@@ -1,15 +1,12 @@
 #include "platform/database/SqlConnection.h"
 
 #include "platform/database/SqlDialect.h"
+#include "platform/database/SqliteFile.h"
 
 #include <QSqlDatabase>
 #include <QSqlError>
 
-#include <unistd.h>
-
 #include <atomic>
-#include <filesystem>
-#include <system_error>
 #include <utility>
 
 namespace Kxg
@@ -30,38 +27,6 @@ QString uniqueName()
 {
     static std::atomic<int> sCount{0};
     return QStringLiteral("kdd-%1").arg(++sCount);
-}
-
-/// By the name that the engine takes, which is UTF-8 whatever the locale says.
-void provideFile(const QString& path, SqlConnection::IfAbsent ifAbsent)
-{
-    const std::filesystem::path file(path.toStdString());
-    std::error_code error;
-    if (ifAbsent == SqlConnection::IfAbsent::Create)
-        std::filesystem::create_directories(file.parent_path(), error);
-    else if (!std::filesystem::exists(file, error) && !error)
-        error = std::make_error_code(std::errc::no_such_file_or_directory);
-    if (error)
-        throw DatabaseError(QString::fromStdString(error.message()));
-}
-
-/// Whether nobody changes the file, because its folder can be read only and no process has left changes in its log.
-/// SQLite would want to make files beside it otherwise.
-bool isFixedFile(const QString& path)
-{
-    const QByteArray file = path.toUtf8();
-    const QByteArray folder = file.left(qMax(1, file.lastIndexOf('/')));
-    std::error_code error;
-    return ::access(file.constData(), R_OK) == 0 && ::access(folder.constData(), W_OK) != 0 &&
-           // The size of an absent log is -1 here, that of an empty one 0.
-           std::filesystem::file_size((path + QLatin1String("-wal")).toStdString(), error) + 1 <= 1;
-}
-
-/// The address by which the engine makes no files beside this one and locks nothing.
-QString fixedFile(const QString& path)
-{
-    return QLatin1String("file:") + QString::fromLatin1(path.toUtf8().toPercentEncoding("/")) +
-           QLatin1String("?immutable=1");
 }
 
 }  // namespace
@@ -105,19 +70,18 @@ bool SqlRows::next()
 /// A handle of Qt's and its place in Qt's list, which may be given up only when nobody holds the handle any more.
 struct SqlConnection::Opened
 {
-    Opened(const DatabaseAddress& address, const SqlDialect& dialect)
-        : name(uniqueName())
+    Opened(const DatabaseAddress& address, const SqlDialect& dialect, IfAbsent ifAbsent)
+        : file(address, ifAbsent)
+        , name(uniqueName())
         , database(QSqlDatabase::addDatabase(dialect.driver, name))
     {
-        const bool isFixed =
-            address.engine == DatabaseAddress::Engine::Sqlite && isFixedFile(address.database);
-        database.setDatabaseName(isFixed ? fixedFile(address.database) : address.database);
+        database.setDatabaseName(file.name());
         database.setHostName(address.host);
         database.setPort(address.port);
         database.setUserName(address.user);
         database.setPassword(address.password);
-        database.setConnectOptions(isFixed ? QStringLiteral("QSQLITE_OPEN_READONLY;QSQLITE_OPEN_URI")
-                                           : dialect.connectOptions);
+        database.setConnectOptions(file.isFixed() ? QStringLiteral("QSQLITE_OPEN_READONLY;QSQLITE_OPEN_URI")
+                                                  : dialect.connectOptions);
     }
     ~Opened()
     {
@@ -128,20 +92,20 @@ struct SqlConnection::Opened
     Opened(const Opened&) = delete;
     Opened& operator=(const Opened&) = delete;
 
+    SqliteFile file;
     const QString name;
     QSqlDatabase database;
 };
 
 SqlConnection::SqlConnection(DatabaseAddress address, IfAbsent ifAbsent)
     : mAddress(std::move(address))
-    , mIfAbsent(ifAbsent)
 {
-    reopen();
+    open(ifAbsent);
 }
 
 SqlConnection::~SqlConnection() = default;
 
-void SqlConnection::reopen()
+void SqlConnection::open(IfAbsent ifAbsent)
 {
     mOnce.reset();
     mStatements.clear();
@@ -150,11 +114,10 @@ void SqlConnection::reopen()
     // Opening would only say that no driver is loaded.
     if (!QSqlDatabase::isDriverAvailable(dialect.driver))
         throw DatabaseError(QStringLiteral("Qt's database driver %1 is not installed").arg(dialect.driver));
-    if (mAddress.engine == DatabaseAddress::Engine::Sqlite)
-        provideFile(mAddress.database, mIfAbsent);
-    auto opened = std::make_unique<Opened>(mAddress, dialect);
+    auto opened = std::make_unique<Opened>(mAddress, dialect, ifAbsent);
     if (!opened->database.open())
         throw errorOf(opened->database.lastError());
+    opened->file.note();
     mOpened = std::move(opened);
     for (const QString& statement : dialect.afterOpening)
         execute(statement);
@@ -162,13 +125,17 @@ void SqlConnection::reopen()
 
 bool SqlConnection::isAlive()
 {
-    return mOpened && QSqlQuery(mOpened->database).exec(QStringLiteral("SELECT 1"));
+    return mOpened && !mOpened->file.isAnother() &&
+           QSqlQuery(mOpened->database).exec(QStringLiteral("SELECT 1"));
 }
 
 // ---- transactions
 
 void SqlConnection::beginOnce(Access access)
 {
+    // The engine goes on with a file that was moved away or replaced, and would never show what is in its place.
+    if (mOpened && mOpened->file.isAnother())
+        throw DatabaseError(QStringLiteral("its file is another one by now"));
     const SqlDialect& dialect = SqlDialect::of(mAddress.engine);
     for (const QString& statement : access == Access::Read ? dialect.beginReading : dialect.beginWriting)
         execute(statement);
@@ -185,7 +152,8 @@ void SqlConnection::begin(Access access)
         // It lives, so the refusal is the engine's own, for example because others write.
         if (isAlive())
             throw;
-        reopen();
+        // A database that was there is not made anew, empty.
+        open(IfAbsent::Fail);
         beginOnce(access);
     }
 }
@@ -202,6 +170,9 @@ void SqlConnection::transact(Access access, const std::function<void()>& work)
     begin(access);
     try {
         work();
+        // What was read of a fixed file while somebody changed it may be anything.
+        if (access == Access::Read && mOpened->file.isFixed() && mOpened->file.isAnother())
+            throw DatabaseError(QStringLiteral("its file was changed while it was read"));
         execute(QStringLiteral("COMMIT"));
     } catch (...) {
         // Whatever was thrown, no transaction may stay open: the connection is used again.

@@ -107,10 +107,9 @@ private:
     void beginOnce(Access access);
     void rollBack() noexcept;
     bool isAlive();
-    void reopen();
+    void open(IfAbsent ifAbsent);
 
     const DatabaseAddress mAddress;
-    const IfAbsent mIfAbsent;
     std::unique_ptr<Opened> mOpened;
     std::map<QByteArray, QSqlQuery> mStatements;  // of mOpened, and gone before it
     std::unique_ptr<QSqlQuery> mOnce;             // likewise

@@ -27,7 +27,8 @@ int openDescriptor(const QByteArray& path, FileLock lock, IfAbsent ifAbsent)
     int fd = -1;
     // A signal may interrupt the opening on a slow mount. That says nothing of the file.
     do {
-        fd = ::open(path.constData(), access | creation | O_CLOEXEC, 0666);
+        // A pipe of that name would be waited for without end.
+        fd = ::open(path.constData(), access | creation | O_CLOEXEC | O_NONBLOCK, 0666);
     } while (fd < 0 && errno == EINTR);
     return fd;
 }
@@ -53,8 +54,8 @@ int checkIdentity(int fd, const QByteArray& path)
     if (::fstat(fd, &opened) != 0)
         return errno;
     // A folder can be opened and locked for reading as a file can, so it has to be refused here.
-    if (S_ISDIR(opened.st_mode))
-        return EISDIR;
+    if (!S_ISREG(opened.st_mode))
+        return S_ISDIR(opened.st_mode) ? EISDIR : EINVAL;
     if (::stat(path.constData(), &named) != 0)
         return errno == ENOENT ? ESTALE : errno;
     const bool same = opened.st_dev == named.st_dev && opened.st_ino == named.st_ino;

@@ -67,7 +67,8 @@ SystemResult failed(const char* action, const QString& path, int error)
 
 int openFile(const QString& path, int flags, mode_t mode = 0)
 {
-    return ::open(pathBytes(path).constData(), flags | O_CLOEXEC, mode);
+    // A pipe of that name would be waited for without end.
+    return ::open(pathBytes(path).constData(), flags | O_CLOEXEC | O_NONBLOCK, mode);
 }
 
 // The small functions below give 0, or the errno.

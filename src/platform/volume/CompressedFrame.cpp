@@ -54,6 +54,8 @@ Result decodeDeflated(const QByteArray& bytes, const FrameLayout& layout, Stored
         return Result::failure(QStringLiteral("%1 deflated bytes cannot hold a frame").arg(bytes.size()));
     const std::unique_ptr<libdeflate_decompressor, decltype(&libdeflate_free_decompressor)> inflater(
         libdeflate_alloc_decompressor(), &libdeflate_free_decompressor);
+    if (inflater == nullptr)
+        return Result::failure(QStringLiteral("There is no memory to decompress the frame"));
     // A frame of an odd number of bytes is padded before it is compressed.
     QByteArray frame(static_cast<int>(size + size % 2), Qt::Uninitialized);
     size_t done = 0;

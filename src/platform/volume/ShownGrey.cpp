@@ -129,6 +129,32 @@ ShownPixels spreadBy(const FrameWindow& window, const TypedData2D& pixels)
     return shown;
 }
 
+/// The pixels with another value in the place of padding; as they are when nothing but padding is there.
+TypedData2D withoutPadding(const TypedData2D& pixels, const ValueRange& padding)
+{
+    const ValueRange all = rangeOf(pixels, padding);
+    const double other = padding.contains(all.lowest) ? all.highest : all.lowest;
+    if (padding.isEmpty() || padding.contains(other))
+        return pixels;
+    TypedData2D filled = pixels;
+    visitPixelType(filled.type, [&](auto zero) {
+        using Value = decltype(zero);
+        auto* values = valuesOf<Value>(filled);
+        std::replace_if(
+            values, values + numValues(filled), [&](Value value) { return padding.contains(double(value)); },
+            static_cast<Value>(other));
+    });
+    return filled;
+}
+
+/// Of the values that a table makes, but for those it makes of padding.
+ValueRange rangeThrough(const LookupTable& table, const TypedData2D& pixels, const ValueRange& padding)
+{
+    const ValueRange range = rangeOf(table.appliedTo(withoutPadding(pixels, padding)));
+    // One value alone shows nothing.
+    return range.lowest < range.highest ? range : rangeOf(table.appliedTo(pixels));
+}
+
 }  // namespace
 
 ShownPixels showGrey(DcmItem& dataset, const FrameView& view, const StoredFrame& stored)
@@ -136,11 +162,12 @@ ShownPixels showGrey(DcmItem& dataset, const FrameView& view, const StoredFrame&
     const ImageAttributes attributes(dataset, view.frame);
     const PrimitiveType type = stored.pixels.type;
     Rescale rescale = rescaleOf(attributes);
-    ShownPixels shown{stored.pixels, rangeOf(stored.pixels, paddingOf(attributes, type))};
+    const ValueRange padding = paddingOf(attributes, type);
+    ShownPixels shown{stored.pixels, rangeOf(stored.pixels, padding)};
     const LookupTable modality = modalityTableOf(attributes, isSigned(type));
     if (!modality.isEmpty()) {
         shown.pixels = modality.appliedTo(stored.pixels);
-        shown.range = rangeOf(shown.pixels);
+        shown.range = rangeThrough(modality, stored.pixels, padding);
         // The table takes the place of the rescale.
         rescale = Rescale();
     }

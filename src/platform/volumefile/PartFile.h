@@ -38,7 +38,8 @@ public:
     /// Whether all was written until now.
     Result state() const;
 
-    /// Brings all to the disk and gives the file its name, in place of another file that may bear it.
+    /// Gives the file its name, in place of another file that may bear it. All was handed to the system, which need not have
+    /// it on the disk yet.
     Result publish();
 
 private:

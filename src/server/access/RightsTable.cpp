@@ -44,8 +44,10 @@ constexpr struct
     const char* kind;
     bool isOpen;
 } kPages[] = {
-    {"", "page", true},         {"page", "page", true},
-    {"viewer", "viewer", true}, {"browser", "browser", false},
+    {"", "page", true},
+    {"page", "page", true},
+    {"viewer", "viewer", true},
+    {"browser", "browser", false},
     {"wado", "wado", false},
 };
 
@@ -84,7 +86,7 @@ void findPage(const Http::Request& request, Asked& asked)
     asked.kind = row->kind;
     if (path.value(0) == "browser" && path.value(1) == "studies")
         asked.study = path.value(2);
-    if (path.value(0) == "wado")
+    else if (path.value(0) == "wado")
         asked.study = request.parameter("studyUID");
     if (effectOf(request.method) != Http::Method::Get)
         asked.verdict = Asked::Verdict::NotSo;

@@ -24,37 +24,82 @@ bool isAnything(const QByteArray& range)
     return range == "*/*";
 }
 
-/// One range of the client against the offer.
-bool fits(const Http::MediaRange& range, const PixelOffer& offer, PixelForm& form)
+/// Whether whoever names the media type alone means this syntax of it.
+bool isUsual(const QByteArray& syntaxUID)
 {
-    const bool isMultipart = range.name == "multipart/related";
-    const QByteArray& type = isMultipart ? range.parts : range.name;
-    const bool isEither = isAnything(range.name) || range.name == "multipart/*";
-    form.isSinglePart = isEither ? offer.prefersSingle && offer.canBeSingle : !isMultipart;
-    if (form.isSinglePart && !offer.canBeSingle)
-        return false;
-
-    const QByteArray stored = mediaTypeOf(offer.transferSyntax);
-    const QByteArray& syntax = range.transferSyntax;
-    const bool isNative = offer.transferSyntax == kExplicitLittleEndian;
-    const bool isNamed = names(type, stored) && stored != kOctetStream;
-    // Whoever takes any transfer syntax takes it under its own name, also where it asks for plain bytes: viewers do.
-    const bool takesStored = syntax == "*" || syntax == offer.transferSyntax ||
-                             (syntax.isEmpty() && (isNamed || isAnything(type)));
-    const bool isStoredType = covers(type, stored) || (type == kOctetStream && !syntax.isEmpty());
-    if (takesStored && isStoredType) {
-        form.isStored = true;
-        form.mediaType = stored;
-        form.transferSyntax = offer.transferSyntax;
-        return true;
+    for (const SyntaxMedia& row : syntaxMedia()) {
+        if (syntaxUID == row.uid)
+            return row.isUsual;
     }
-    const bool takesDecoded = syntax.isEmpty() || syntax == kExplicitLittleEndian;
-    if (!takesDecoded || !covers(type, kOctetStream) || !offer.canDecode)
-        return false;
-    form.isStored = isNative;
-    form.mediaType = kOctetStream;
-    form.transferSyntax = kExplicitLittleEndian;
-    return true;
+    return false;
+}
+
+/// One way to give pixels, without its packing.
+struct Candidate
+{
+    QByteArray mediaType;
+    QByteArray syntax;
+    bool isStored = false;   // the bytes as they lie in the file
+    bool isDecoded = false;  // plain bytes, stored so or decoded
+};
+
+/// How closely the range of types, whose transfer syntax may be named as well, fits the candidate; 0: not at all.
+int fitOf(const QByteArray& type, const QByteArray& syntax, const Candidate& candidate)
+{
+    const bool isOctets = type == kOctetStream;
+    const int named = syntax.isEmpty() ? 0 : syntax == "*" ? 1 : 2;
+    if (candidate.isDecoded) {
+        const bool takesPlain = syntax.isEmpty() || syntax == kExplicitLittleEndian;
+        return (takesPlain || (syntax == "*" && candidate.isStored)) && covers(type, kOctetStream) ? 1 + named
+                                                                                                   : 0;
+    }
+    if (!candidate.isStored) {
+        const bool isMeant = type == candidate.mediaType &&
+                             (syntax.isEmpty() ? isUsual(candidate.syntax) : syntax == candidate.syntax);
+        return isMeant || (isOctets && syntax == candidate.syntax) ? 1 + named : 0;
+    }
+    // Whoever takes any transfer syntax takes it under its own name, also where it asks for plain bytes: viewers do.
+    const bool isNamed = names(type, candidate.mediaType) && candidate.mediaType != kOctetStream;
+    const bool takesStored =
+        syntax == "*" || syntax == candidate.syntax || (syntax.isEmpty() && (isNamed || isAnything(type)));
+    const bool isType = covers(type, candidate.mediaType) || (isOctets && !syntax.isEmpty());
+    return takesStored && isType ? 1 + named : 0;
+}
+
+/// How welcome the candidate is, alone or as a part: as the range says that fits it most closely [thousandths].
+int qualityOf(const Http::AcceptHeader& accept, const Candidate& candidate, bool isSinglePart)
+{
+    int closest = 0;
+    int quality = 0;
+    for (const Http::MediaRange& range : accept.ranges()) {
+        const bool isMultipart = range.name == "multipart/related";
+        const bool isEither = isAnything(range.name);
+        if (!isEither && isSinglePart == (isMultipart || range.name == "multipart/*"))
+            continue;
+        const QByteArray& type = isMultipart || range.name == "multipart/*" ? range.parts : range.name;
+        const int fit = fitOf(type, range.transferSyntax, candidate);
+        // A named type is closer than a group of them, a group closer than anything, whatever the syntax.
+        const int group = isEither || type.isEmpty() ? 0 : type.endsWith("/*") ? 1 : 2;
+        const int closeness = fit == 0 ? 0 : fit + 4 * group + (isEither ? 0 : 1);
+        if (closeness > closest) {
+            closest = closeness;
+            quality = range.quality;
+        }
+    }
+    return quality;
+}
+
+/// By what they cost.
+QVector<Candidate> candidatesOf(const PixelOffer& offer)
+{
+    const bool isNative = offer.transferSyntax == kExplicitLittleEndian;
+    QVector<Candidate> candidates = {
+        {mediaTypeOf(offer.transferSyntax), offer.transferSyntax, true, isNative}};
+    if (!isNative && offer.canDecode)
+        candidates.append({kOctetStream, kExplicitLittleEndian, false, true});
+    for (const QByteArray& uid : offer.encodings)
+        candidates.append({mediaTypeOf(uid), uid, false, false});
+    return candidates;
 }
 
 bool packingOf(const Http::MediaRange& range, bool canBeSingle, InstanceForm::Packing& packing)
@@ -88,8 +133,8 @@ const QVector<SyntaxMedia>& syntaxMedia()
         {"1.2.840.10008.1.2.4.53", "image/jpeg"},
         {"1.2.840.10008.1.2.4.55", "image/jpeg"},
         {"1.2.840.10008.1.2.4.57", "image/jpeg"},
-        {"1.2.840.10008.1.2.4.70", "image/jpeg"},
-        {"1.2.840.10008.1.2.4.80", "image/jls"},
+        {"1.2.840.10008.1.2.4.70", "image/jpeg", true},
+        {"1.2.840.10008.1.2.4.80", "image/jls", true},
         {"1.2.840.10008.1.2.4.81", "image/jls"},
         {"1.2.840.10008.1.2.4.90", "image/jp2"},
         {"1.2.840.10008.1.2.4.91", "image/jp2"},
@@ -110,7 +155,7 @@ const QVector<SyntaxMedia>& syntaxMedia()
         {"1.2.840.10008.1.2.4.201", "image/jphc"},
         {"1.2.840.10008.1.2.4.202", "image/jphc"},
         {"1.2.840.10008.1.2.4.203", "image/jphc"},
-        {"1.2.840.10008.1.2.5", "image/dicom-rle"},
+        {"1.2.840.10008.1.2.5", "image/dicom-rle", true},
         {"1.2.840.10008.1.2.8.1", "application/x-deflate"},
     };
     return table;
@@ -132,25 +177,46 @@ bool isVideo(const QByteArray& syntaxUID)
 
 bool choosePixelForm(const Http::AcceptHeader& accept, const PixelOffer& offer, PixelForm& form)
 {
-    for (const Http::MediaRange& range : accept.ranges()) {
-        PixelForm fitting;
-        if (range.quality > 0 && fits(range, offer, fitting)) {
-            form = fitting;
-            return true;
+    int best = 0;
+    for (const Candidate& candidate : candidatesOf(offer)) {
+        for (const bool isSinglePart : {offer.prefersSingle, !offer.prefersSingle}) {
+            if (isSinglePart && !offer.canBeSingle)
+                continue;
+            const int quality = qualityOf(accept, candidate, isSinglePart);
+            if (quality <= best)
+                continue;
+            best = quality;
+            form = {candidate.isStored, isSinglePart, candidate.mediaType, candidate.syntax};
         }
     }
-    return false;
+    return best > 0;
 }
 
-QByteArray InstanceForm::syntaxFor(const QByteArray& stored, bool canDecode) const
+/// What is named counts more than "as stored".
+int InstanceForm::qualityOf(const QByteArray& uid, bool isStored) const
 {
-    for (const QByteArray& syntax : syntaxes) {
-        if (syntax == "*" || syntax == stored)
-            return stored;
-        if (canDecode && (syntax == kExplicitLittleEndian || syntax == kImplicitLittleEndian))
-            return syntax;
+    int quality = 0;
+    for (const Syntax& each : syntaxes) {
+        if (each.uid == uid)
+            return each.quality;
+        if (each.uid == "*" && isStored)
+            quality = qMax(quality, each.quality);
     }
-    return {};
+    return quality;
+}
+
+QByteArray InstanceForm::syntaxFor(const QByteArray& stored, const QVector<QByteArray>& others) const
+{
+    QByteArray chosen = stored;
+    int best = qualityOf(stored, true);
+    for (const QByteArray& uid : others) {
+        const int quality = qualityOf(uid, false);
+        if (quality <= best)
+            continue;
+        best = quality;
+        chosen = uid;
+    }
+    return best > 0 ? chosen : QByteArray();
 }
 
 bool chooseInstanceForm(const Http::AcceptHeader& accept, bool canBeSingle, InstanceForm& form)
@@ -158,13 +224,15 @@ bool chooseInstanceForm(const Http::AcceptHeader& accept, bool canBeSingle, Inst
     bool isChosen = false;
     for (const Http::MediaRange& range : accept.ranges()) {
         InstanceForm::Packing packing = InstanceForm::Packing::Multipart;
-        if (range.quality == 0 || !packingOf(range, canBeSingle, packing))
+        if (!packingOf(range, canBeSingle, packing) || (range.quality == 0 && !isChosen))
             continue;
         if (!isChosen)
-            form = {packing, {}};
+            form = InstanceForm{packing, {}};
         isChosen = true;
         if (packing == form.packing)
-            form.syntaxes.append(range.transferSyntax.isEmpty() ? kExplicitLittleEndian : range.transferSyntax);
+            form.syntaxes.append(
+                {range.transferSyntax.isEmpty() ? kExplicitLittleEndian : range.transferSyntax,
+                 range.quality});
     }
     return isChosen;
 }

@@ -10,6 +10,7 @@ namespace Kdd::DicomWeb
 
 inline const QByteArray kExplicitLittleEndian("1.2.840.10008.1.2.1");
 inline const QByteArray kImplicitLittleEndian("1.2.840.10008.1.2");
+inline const QByteArray kDeflatedLittleEndian("1.2.840.10008.1.2.1.99");
 inline const QByteArray kOctetStream("application/octet-stream");
 
 /// A transfer syntax, and what frames that have it are outside of DICOM.
@@ -17,6 +18,7 @@ struct SyntaxMedia
 {
     const char* uid;
     const char* mediaType;
+    bool isUsual = false;  ///< meant by whoever names the media type alone, where that stands for several
 };
 
 /// All that are known.
@@ -44,12 +46,16 @@ struct PixelOffer
 {
     QByteArray transferSyntax;  ///< as stored; of those without compression always explicit VR little endian
     bool canDecode = true;
-    bool canBeSingle = true;    ///< there is only one part
-    bool prefersSingle = false; ///< where the client takes both alike
+    bool canBeSingle = true;     ///< there is only one part
+    bool prefersSingle = false;  ///< where the client takes both alike
+    QVector<QByteArray>
+        encodings;  ///< other transfer syntaxes in which they can be given, the cheapest first
 };
 
-/// Chooses what the client likes best of what can be given. As stored is given where it names the stored syntax or media
-/// type, "*" as the transfer syntax, or takes anything; else decoded pixels. False when there is nothing that suits.
+/// Chooses what the client likes best of what can be given; of what it likes alike the cheapest, which is as stored, then
+/// decoded. As stored is given where it names the stored syntax or media type, "*" as the transfer syntax, or takes
+/// anything; another syntax with compression where it names that, or the media type of which it is the usual one. False
+/// when there is nothing that suits.
 bool choosePixelForm(const Http::AcceptHeader& accept, const PixelOffer& offer, PixelForm& form);
 
 /// In which form whole objects are sent.
@@ -57,12 +63,22 @@ struct InstanceForm
 {
     enum class Packing { Multipart, Single, Zip };
 
-    Packing packing = Packing::Multipart;
-    QVector<QByteArray> syntaxes;  ///< that the client takes, best first; "*" is as stored
+    /// A transfer syntax that the client names; "*" is as stored.
+    struct Syntax
+    {
+        QByteArray uid;
+        int quality = 0;  ///< [thousandths]; 0: not this one
+    };
 
-    /// The one in which an object is given; empty when it cannot be. `canDecode` tells whether its pixels can be given
-    /// without compression.
-    QByteArray syntaxFor(const QByteArray& stored, bool canDecode) const;
+    Packing packing = Packing::Multipart;
+    QVector<Syntax> syntaxes;  ///< best first
+
+    /// The one in which an object is given; empty when it cannot be. `others` are those it can be given in beside the
+    /// stored one, the cheapest first.
+    QByteArray syntaxFor(const QByteArray& stored, const QVector<QByteArray>& others) const;
+
+private:
+    int qualityOf(const QByteArray& uid, bool isStored) const;
 };
 
 /// False when the client takes no form of whole objects. `canBeSingle`: there is only one of them.

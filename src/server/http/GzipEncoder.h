@@ -12,7 +12,10 @@ namespace Kdd::Http
 class GzipEncoder
 {
 public:
-    GzipEncoder();
+    /// What stands around the compressed bytes.
+    enum class Frame { Gzip, None };
+
+    explicit GzipEncoder(Frame frame = Frame::Gzip);
     ~GzipEncoder();
 
     /// Appends to `out` what is ready of the blocks until now; seldom all of it.
@@ -25,5 +28,8 @@ private:
     struct Private;
     std::unique_ptr<Private> d;
 };
+
+/// The whole of a body.
+QByteArray gzipped(const QByteArray& bytes);
 
 }  // namespace Kdd::Http

@@ -43,11 +43,13 @@ struct HttpServer::Private
     template <typename Each>
     void onSessions(Each each);
     bool awaitEnd(std::chrono::milliseconds time);
+    std::shared_ptr<TlsContext> readCertificate(Result& result) const;
+    std::shared_ptr<TlsContext> tlsContext() const { return std::atomic_load(&tls); }
 
     std::vector<std::unique_ptr<SessionThread>> threads;
     WorkerThreads workers;
     SessionHost host;
-    std::unique_ptr<TlsContext> tls;
+    std::shared_ptr<TlsContext> tls;  // null without TLS; atomic, for it may be renewed
     std::unique_ptr<Listener> listener;
     std::size_t nextThread = 0;
     std::mutex mutex;
@@ -74,15 +76,16 @@ void HttpServer::Private::open(SessionThread& thread, int socket, const QByteArr
 {
     auto connection = std::make_shared<Connection>(thread.io, socket);
     std::unique_ptr<Transport> transport;
-    if (tls != nullptr && !isRefused)
-        transport = tls->accept(socket);
+    const std::shared_ptr<TlsContext> secure = tlsContext();
+    if (secure != nullptr && !isRefused)
+        transport = secure->accept(socket);
     else
         transport = std::make_unique<PlainTransport>(socket);
     const auto session =
         std::make_shared<Session>(host, std::move(connection), std::move(transport), peer,
                                   [this, &thread](Session& ended) { closed(thread, ended); });
     thread.sessions.emplace(session.get(), session);
-    if (host.stops || (isRefused && tls != nullptr))
+    if (host.stops || (isRefused && secure != nullptr))
         session->abort();
     else if (isRefused)
         session->refuse();
@@ -112,6 +115,12 @@ void HttpServer::Private::onSessions(Each each)
     }
 }
 
+std::shared_ptr<TlsContext> HttpServer::Private::readCertificate(Result& result) const
+{
+    const HttpSettings& settings = host.settings;
+    return TlsContext::make(settings.certificateFile, settings.keyFile, settings.clientCaFile, result);
+}
+
 /// Whether all sessions came to their end.
 bool HttpServer::Private::awaitEnd(std::chrono::milliseconds time)
 {
@@ -135,7 +144,7 @@ Result HttpServer::start()
     HttpSettings& settings = d->host.settings;
     if (!settings.certificateFile.isEmpty()) {
         Result result;
-        d->tls = TlsContext::make(settings.certificateFile, settings.keyFile, settings.clientCaFile, result);
+        d->tls = d->readCertificate(result);
         if (result.bad())
             return result;
     }
@@ -148,6 +157,17 @@ Result HttpServer::start()
         thread->io.start();
     d->isStarted = true;
     return {};
+}
+
+Result HttpServer::renewCertificate()
+{
+    Result result;
+    std::shared_ptr<TlsContext> renewed;
+    if (d->tlsContext() != nullptr)
+        renewed = d->readCertificate(result);
+    if (renewed != nullptr)
+        std::atomic_store(&d->tls, renewed);
+    return result;
 }
 
 void HttpServer::stop()
@@ -173,7 +193,7 @@ void HttpServer::stop()
 
 QByteArray HttpServer::address() const
 {
-    const char* const scheme = d->tls != nullptr ? "https://" : "http://";
+    const char* const scheme = d->tlsContext() != nullptr ? "https://" : "http://";
     return scheme + d->host.settings.address.text();
 }
 

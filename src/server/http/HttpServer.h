@@ -24,6 +24,10 @@ public:
     /// Answers from here on. On failure (the address is taken, the certificate cannot be read) nothing has begun.
     Result start();
 
+    /// Reads certificate and key anew, for connections that come from here on. On failure the former ones stay. May be called
+    /// on any thread, between start and stop.
+    Result renewCertificate();
+
     /// Takes no more connections, ends those that rest, and returns when the requests in flight are answered, or their time
     /// is over.
     void stop();

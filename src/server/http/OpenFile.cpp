@@ -27,14 +27,29 @@ QByteArray identityOf(const struct stat& status)
            '-' + nanoseconds(status.st_ctim);
 }
 
+bool isSame(const timespec& one, const timespec& other)
+{
+    return one.tv_sec == other.tv_sec && one.tv_nsec == other.tv_nsec;
+}
+
+/// File systems tick once in two seconds at the slowest.
+constexpr time_t kSettledAge = 3;  // [s]
+
+bool isOlder(const struct stat& status)
+{
+    timespec now = {};
+    return ::clock_gettime(CLOCK_REALTIME, &now) == 0 && now.tv_sec - status.st_mtim.tv_sec >= kSettledAge &&
+           now.tv_sec - status.st_ctim.tv_sec >= kSettledAge;
+}
+
 }  // namespace
 
-std::shared_ptr<const OpenFile> OpenFile::open(const QByteArray& path, Result& result)
+std::shared_ptr<const OpenFile> OpenFile::open(const QByteArray& path, Result& result, Changes changes)
 {
     const std::shared_ptr<OpenFile> file(new OpenFile);
     // Not to be blocked by a pipe of that name.
     file->mDescriptor = ::open(path.constData(), O_RDONLY | O_CLOEXEC | O_NONBLOCK);
-    struct stat status = {};
+    struct stat& status = file->mStatus;
     if (file->mDescriptor < 0 || ::fstat(file->mDescriptor, &status) != 0) {
         result = Result(SystemResult::of(errno)).within(QFile::decodeName(path));
         return nullptr;
@@ -45,6 +60,8 @@ std::shared_ptr<const OpenFile> OpenFile::open(const QByteArray& path, Result& r
     }
     file->mSize = status.st_size;
     file->mIdentity = identityOf(status);
+    file->mIsSettled = isOlder(status);
+    file->mChanges = changes;
     result = {};
     return file;
 }
@@ -53,6 +70,21 @@ OpenFile::~OpenFile()
 {
     if (mDescriptor >= 0)
         ::close(mDescriptor);
+}
+
+Result OpenFile::checkUnchanged() const
+{
+    struct stat now = {};
+    if (::fstat(mDescriptor, &now) != 0)
+        return SystemResult::of(errno);
+    // A name that is given or taken is a change too, though not of the content.
+    const bool isRenamed = now.st_nlink != mStatus.st_nlink;
+    if (now.st_size < mStatus.st_size)
+        return Result::failure(QStringLiteral("the file was cut short"));
+    if (now.st_size != mStatus.st_size || !isSame(now.st_mtim, mStatus.st_mtim) ||
+        (!isRenamed && !isSame(now.st_ctim, mStatus.st_ctim)))
+        return Result::failure(QStringLiteral("the file was changed"));
+    return {};
 }
 
 Result OpenFile::read(qint64 offset, qint64 length, QByteArray& bytes) const
@@ -69,10 +101,10 @@ Result OpenFile::read(qint64 offset, qint64 length, QByteArray& bytes) const
         if (got < 0)
             return SystemResult::of(errno);
         if (got == 0)
-            return Result::failure(QStringLiteral("it was cut short"));
+            return Result::failure(QStringLiteral("the file was cut short"));
         done += got;
     }
-    return {};
+    return refusesChanges() ? checkUnchanged() : Result();
 }
 
 }  // namespace Kdd::Http

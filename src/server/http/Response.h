@@ -19,8 +19,9 @@ class Producer
 public:
     virtual ~Producer() = default;
 
-    /// Replaces `block` by the next bytes, some 64 KiB; empty at the end. After a failure the connection is closed
-    /// before the end of the body, so that the client sees that something is missing.
+    /// Replaces `block` by the next bytes, some 64 KiB; empty at the end. What was reserved of it stays so from block to
+    /// block. After a failure the connection is closed before the end of the body, so that the client sees that something
+    /// is missing.
     virtual Result next(QByteArray& block) = 0;
 };
 

@@ -241,7 +241,7 @@ ResponseWriter::Step ResponseWriter::broken(const QString& fault)
 /// had.
 bool ResponseWriter::prepare(Transport& transport)
 {
-    mBlock.clear();
+    mBlock.resize(0);
     mBlockSent = 0;
     BodyPart& part = mResponse.body[mPart];
     bool isReady = true;
@@ -261,7 +261,7 @@ bool ResponseWriter::prepare(Transport& transport)
 void ResponseWriter::frame()
 {
     if (!mBlock.isEmpty())
-        mBlock = QByteArray::number(mBlock.size(), 16) + "\r\n" + mBlock + "\r\n";
+        mBlock.prepend(QByteArray::number(mBlock.size(), 16) + "\r\n").append("\r\n");
     if (isAtEnd())
         mBlock += "0\r\n\r\n";
 }
@@ -282,7 +282,9 @@ bool ResponseWriter::prepareBlock(Producer& producer)
 
 bool ResponseWriter::prepareFile(Transport& transport, FileRange& range)
 {
-    mSendsFile = range.length > 0 && transport.sendsFiles() && mFraming != Framing::Chunks;
+    // Its last byte is read, which tells of a change: without it the answer does not come to its end.
+    mHeldBack = range.file->refusesChanges() ? 1 : 0;
+    mSendsFile = range.length > mHeldBack && transport.sendsFiles() && mFraming != Framing::Chunks;
     if (mSendsFile)
         return true;
     const qint64 size = std::min(range.length, kReadBlock);
@@ -296,10 +298,9 @@ void ResponseWriter::advance(FileRange& range, qint64 sent)
 {
     range.offset += sent;
     range.length -= sent;
-    if (range.length > 0)
-        return;
-    mSendsFile = false;
-    ++mPart;
+    mSendsFile = mSendsFile && range.length > mHeldBack;
+    if (range.length == 0)
+        ++mPart;
 }
 
 Transport::Outcome ResponseWriter::sendPrepared(Transport& transport)
@@ -308,7 +309,7 @@ Transport::Outcome ResponseWriter::sendPrepared(Transport& transport)
     Transport::Outcome outcome{};
     if (mSendsFile) {
         auto& range = std::get<FileRange>(mResponse.body[mPart]);
-        outcome = transport.sendFile(*range.file, range.offset, range.length, count);
+        outcome = transport.sendFile(*range.file, range.offset, range.length - mHeldBack, count);
         advance(range, count);
     } else {
         const auto more = isAtEnd() ? Transport::More::No : Transport::More::Yes;

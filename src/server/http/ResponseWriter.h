@@ -60,6 +60,7 @@ private:
     qint64 mBlockSent = 0;    // of those
     std::size_t mPart = 0;    // of the body, that goes after the block
     bool mSendsFile = false;  // that part, a range, by the transport
+    qint64 mHeldBack = 0;     // of its end, which is read
     qint64 mBytesSent = 0;
     QString mFault;
 };

@@ -20,8 +20,7 @@ public:
                                             const QByteArray& clientCaFile, Result& result);
     ~TlsContext();
 
-    /// For the server's side of a connection. The socket stays the caller's, and open for longer than what is returned;
-    /// so does this object.
+    /// For the server's side of a connection. The socket stays the caller's, and open for longer than what is returned.
     std::unique_ptr<Transport> accept(int socket);
 
 private:

@@ -5,6 +5,7 @@
 #include <QFile>
 
 #include <kddlib/ArchiveDatabase.h>
+#include <kddlib/FileStatus.h>
 #include <kddlib/Limits.h>
 #include <kddlib/LogFile.h>
 #include <kddlib/QAData.h>
@@ -77,7 +78,7 @@ bool readImages(const CorrectionRequest& request, QAData& job)
 /// Asked of the folder, because a study that the database does not know can be corrected as well.
 bool hasTagFile(const QByteArray& studyUID)
 {
-    return QFile::exists(TagFile::cacheFilePathForStudy(studyUID.constData()));
+    return presenceOf(TagFile::cacheFilePathForStudy(studyUID.constData())) != FilePresence::Absent;
 }
 
 /// Of a move the new study may not be there yet, and the old one no longer, so neither has a beginning that names it.

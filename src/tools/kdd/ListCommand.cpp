@@ -1,9 +1,9 @@
 #include "tools/kdd/Commands.h"
 #include "tools/kdd/Database.h"
 #include "tools/kdd/Report.h"
+#include "tools/kdd/Store.h"
 
 #include <QDate>
-#include <QFileInfo>
 #include <QJsonArray>
 
 #include <kddlib/LogFile.h>
@@ -51,7 +51,7 @@ ListedStudy describe(const Kxg::StudySummary& study)
             study.series,
             study.images,
             study.volumes,
-            QFileInfo(tagFile).size(),
+            sizeOf(tagFile),
             study.isWaiting};
 }
 

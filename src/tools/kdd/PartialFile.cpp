@@ -4,8 +4,11 @@
 #include <QJsonObject>
 #include <QSaveFile>
 
+#include <fcntl.h>
 #include <kddlib/ExclusiveFile.h>
 #include <kddlib/LogFile.h>
+#include <kddlib/PathName.h>
+#include <kddlib/SystemResult.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -43,6 +46,20 @@ QString text(const std::string& bytes)
 std::string bytes(const QJsonValue& value)
 {
     return value.toString().toStdString();
+}
+
+/// 0, or the errno.
+int flushFolderOf(const QByteArray& path)
+{
+    const int slash = path.lastIndexOf('/');
+    const QByteArray folder = slash < 0 ? QByteArray(".") : path.left(qMax(1, slash));
+    const int descriptor = ::open(folder.constData(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+    if (descriptor < 0)
+        return errno;
+    // EINVAL: a file system that knows no flushing of folders, so nothing is left to do.
+    const int error = ::fsync(descriptor) == 0 || errno == EINVAL ? 0 : errno;
+    ::close(descriptor);
+    return error;
 }
 
 }  // namespace
@@ -119,8 +136,9 @@ bool PartialFile::append(const char* bytes, qint64 count)
         const ssize_t written = ::write(mFile.handle(), bytes, static_cast<std::size_t>(count));
         if (written < 0 && errno == EINTR)
             continue;
+        // Nothing written is no error of the system, and would go on for ever.
         if (written <= 0)
-            return refuse("cannot be written", QString::fromLocal8Bit(std::strerror(errno)));
+            return refuse("cannot be written", SystemResult::textOf(written < 0 ? errno : EIO));
         bytes += written;
         count -= written;
     }
@@ -131,9 +149,11 @@ bool PartialFile::publish(bool flush)
 {
     // First the bytes, so that what has the name is complete also after a loss of power.
     const bool isOnDisk = !flush || ::fsync(mFile.handle()) == 0;
-    if (!isOnDisk ||
-        std::rename(QFile::encodeName(path()).constData(), QFile::encodeName(mTarget).constData()) != 0)
-        return refuse("cannot be given its name", QString::fromLocal8Bit(std::strerror(errno)));
+    if (!isOnDisk || std::rename(pathBytes(path()).constData(), pathBytes(mTarget).constData()) != 0)
+        return refuse("cannot be given its name", SystemResult::textOf(errno));
+    if (const int error = flush ? flushFolderOf(pathBytes(mTarget)) : 0)
+        LogFile::warnf("%s has its name, which a loss of power may take again: %s", qUtf8Printable(mTarget),
+                       qUtf8Printable(SystemResult::textOf(error)));
     // Left behind by a crash it tells of a part that is not there, and nothing is continued without bytes.
     QFile::remove(recordPath());
     return true;

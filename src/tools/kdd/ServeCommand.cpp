@@ -4,14 +4,17 @@
 
 #include <QFile>
 
+#include <fcntl.h>
 #include <kddlib/ExResource.h>
 #include <kddlib/Kxg.h>
 #include <kddlib/LogFile.h>
 #include <kddlib/PathName.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <csignal>
 #include <cstdio>
+#include <functional>
 #include <memory>
 #include <thread>
 
@@ -35,26 +38,39 @@ struct ServeRequest
     QList<QByteArray> hosts;
 };
 
-/// While it lives the signals that end a process wait to be asked for, by threads that are started meanwhile too.
-class EndSignals
+/// Whether the process would go with a terminal that is closed. nohup has that signal ignored.
+bool belongsToTerminal()
+{
+    struct sigaction action = {};
+    const int terminal = ::open("/dev/tty", O_RDONLY | O_CLOEXEC | O_NOCTTY);
+    if (terminal >= 0)
+        ::close(terminal);
+    return terminal >= 0 && ::sigaction(SIGHUP, nullptr, &action) == 0 && action.sa_handler == SIG_DFL;
+}
+
+/// While it lives the signals that are meant for a server wait to be asked for, by threads that are started meanwhile too.
+class ServerSignals
 {
 public:
-    EndSignals()
+    ServerSignals()
     {
         sigemptyset(&mSignals);
         sigaddset(&mSignals, SIGINT);
         sigaddset(&mSignals, SIGTERM);
+        if (!belongsToTerminal())
+            sigaddset(&mSignals, SIGHUP);
         ::pthread_sigmask(SIG_BLOCK, &mSignals, &mFormer);
     }
-    ~EndSignals() { ::pthread_sigmask(SIG_SETMASK, &mFormer, nullptr); }
-    EndSignals(const EndSignals&) = delete;
-    EndSignals& operator=(const EndSignals&) = delete;
+    ~ServerSignals() { ::pthread_sigmask(SIG_SETMASK, &mFormer, nullptr); }
+    ServerSignals(const ServerSignals&) = delete;
+    ServerSignals& operator=(const ServerSignals&) = delete;
 
-    /// Returns with the first one; a second one ends the process.
-    void await() const
+    /// Returns with the first one that ends the process; a second one ends it at once.
+    void awaitEnd(const std::function<void()>& renew) const
     {
-        int signal = 0;
-        ::sigwait(&mSignals, &signal);
+        int signal = SIGHUP;
+        for (::sigwait(&mSignals, &signal); signal == SIGHUP; ::sigwait(&mSignals, &signal))
+            renew();
         std::signal(SIGINT, SIG_DFL);
         std::signal(SIGTERM, SIG_DFL);
         ::pthread_sigmask(SIG_UNBLOCK, &mSignals, nullptr);
@@ -149,7 +165,7 @@ bool readSettings(const ServeRequest& request, ServerSettings& settings)
     return true;
 }
 
-void tellAddress(const GlobalOptions& options, const Server& server)
+void tellAddress(const GlobalOptions& options, const Server& server, bool hasViewer)
 {
     const QString address = QString::fromLatin1(server.address());
     const QString status = QString::fromLatin1(server.statusAddress());
@@ -157,6 +173,8 @@ void tellAddress(const GlobalOptions& options, const Server& server)
         printJson({{QStringLiteral("address"), address}, {QStringLiteral("status"), status}});
     } else {
         std::printf("Serving at %s\n", qUtf8Printable(address));
+        if (hasViewer)
+            std::printf("Viewer at %s/viewer/\n", qUtf8Printable(address));
         if (!status.isEmpty())
             std::printf("Watched at %s\n", qUtf8Printable(status));
     }
@@ -171,12 +189,24 @@ void warnOfNoArchive()
         LogFile::warnf("There is no archive here yet: %s", qUtf8Printable(result.text()));
 }
 
+void renewCertificate(Server& server)
+{
+    if (!server.address().startsWith("https:"))
+        return LogFile::printf("There is no certificate to be read anew: TLS is not in use");
+    const Result result = server.renewCertificate();
+    if (result.bad())
+        LogFile::errorf("The former certificate stays in use: %s", qUtf8Printable(result.text()));
+    else
+        LogFile::printf("Certificate and key were read anew");
+}
+
 Outcome runServe(const GlobalOptions& options, const ServeRequest& request)
 {
     ServerSettings settings;
     if (!readSettings(request, settings))
         return Outcome::WrongUsage;
-    const EndSignals end;
+    const ServerSignals received;
+    const bool hasViewer = !settings.viewer.isEmpty();
     Result result;
     const std::unique_ptr<Server> server = Server::make(settings, result);
     if (server != nullptr)
@@ -186,8 +216,8 @@ Outcome runServe(const GlobalOptions& options, const ServeRequest& request)
         return Outcome::Failed;
     }
     warnOfNoArchive();
-    tellAddress(options, *server);
-    end.await();
+    tellAddress(options, *server, hasViewer);
+    received.awaitEnd([&] { renewCertificate(*server); });
     server->stop();
     return Outcome::Done;
 }

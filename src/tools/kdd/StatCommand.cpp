@@ -2,8 +2,6 @@
 #include "tools/kdd/Selection.h"
 #include "tools/kdd/Store.h"
 
-#include <QFileInfo>
-
 #include <cstdio>
 #include <memory>
 
@@ -35,7 +33,7 @@ Outcome runStat(const GlobalOptions& options, const QByteArray& study)
                 {"uncompressedSize", statistics.uncompressedSize},
                 {"unoptimisedSize", statistics.unoptimisedSize},
                 {"blobBytes", statistics.blobBytes},
-                {"fileSize", QFileInfo(file.cacheFilePath()).size()}};
+                {"fileSize", sizeOf(file.cacheFilePath())}};
     if (options.json) {
         QJsonObject object;
         for (const auto& row : rows)

@@ -80,6 +80,12 @@ bool readTagFile(const QString& path, TagFile& file)
     return false;
 }
 
+qint64 sizeOf(const QString& path)
+{
+    FileStatus status;
+    return statusOf(pathBytes(path).constData(), status) ? status.size : 0;
+}
+
 QList<QByteArray> ownPlaces(const GlobalOptions& options)
 {
     // Folders end in a slash, files do not.

@@ -215,7 +215,7 @@ TEST_F(TagFileCache, AFullDiskLeavesTheOldFileWholeAndNoNewOne)
     }
     ASSERT_TRUE(put(1, 4, write));
     const QByteArray before = content();
-    for (const auto& [keepOpen, how] : {std::pair(false, write), {true, write}, {false, merge}})
+    for (const auto& [keepOpen, how] : {std::pair(false, &write), {true, write}, {false, merge}})
         EXPECT_EQ(
             inChild([&, keepOpen = keepOpen, how = how] { return isRefused(before.size(), keepOpen, how); }),
             1);

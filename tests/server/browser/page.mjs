@@ -168,6 +168,7 @@ async function walkHostile() {
   await page.$eval('.tabs a[href$=corrections]', (link) => link.focus());
   await page.keyboard.press('Enter');
   await present('.correction');
+  check((await text('.correction header')).startsWith('2024-06-01 09:30:00anna'), 'the time of a correction is not the job\'s');
   await shoot('corrections');
   check(await page.evaluate(() => window.owned === undefined && !document.querySelector('img[src=x], main script')), 'markup of a value came alive');
   await page.goto(`${root}/#/studies/1.2.3.4.5.6.7.8.9`);

@@ -66,7 +66,7 @@ protected:
     {
         Http::Request request;
         request.query = std::move(query);
-        request.headers = {{"accept", accept}};
+        request.headers = {{"accept", accept}, {"if-none-match", mHeld}};
         ResourcePath path;
         EXPECT_TRUE(ResourcePath::parse(
             (what.startsWith("studies") ? what : kPath + what).split('/').toVector(), path));
@@ -87,11 +87,23 @@ protected:
 
     TemporaryStore mStore;
     LogCapture mLog;
-    StudyShelf mShelf{1 << 30, std::chrono::nanoseconds(-1'000'000'000)};
-    RenderedResource mRendered{mShelf};
-    ThumbnailResource mThumbnail{mShelf};
+    std::shared_ptr<StudyShelf> mShelf =
+        std::make_shared<StudyShelf>(1 << 30, std::chrono::nanoseconds(-1'000'000'000));
+    std::shared_ptr<ObjectShelf> mObjects = std::make_shared<ObjectShelf>(1 << 20);
+    RenderedResource mRendered{mShelf, mObjects};
+    ThumbnailResource mThumbnail{mShelf, mObjects};
     QByteArray mFile;
+    QByteArray mHeld;  // tags that the client says it has
 };
+
+QByteArray tagOf(const Http::Response& response)
+{
+    for (const Http::Field& field : response.headers) {
+        if (field.name == "ETag")
+            return field.value;
+    }
+    return {};
+}
 
 TEST_F(RenderTest, ShowsValuesByTheWindowThatIsAskedFor)
 {
@@ -209,6 +221,61 @@ TEST_F(RenderTest, MakesThumbnailsOfWhatIsStoredWhereThatDoes)
     EXPECT_EQ(QImage::fromData(body(ask("thumbnail", {{"viewport", "32,32"}}, "image/jpeg"))).size(),
               QSize(32, 16));
     EXPECT_EQ(QImage::fromData(body(ask("frames/2/thumbnail", {}, "image/jpeg"))).size(), QSize(256, 256));
+}
+
+TEST_F(RenderTest, TellsThatAPictureIsTheSameAsLongAsItIs)
+{
+    for (const char* what : {"rendered", "frames/2/rendered", "thumbnail", "studies/1.2/rendered"}) {
+        store(aGreyImage());
+        mHeld.clear();
+        mHeld = tagOf(ask(what, {}, "image/jpeg"));
+        ASSERT_FALSE(mHeld.isEmpty()) << what;
+        const Http::Response same = ask(what, {}, "image/jpeg");
+        EXPECT_EQ(same.status, 304) << what;
+        EXPECT_EQ(tagOf(same), mHeld);
+        EXPECT_EQ(ask(what, {{"viewport", "4,4"}}, "image/jpeg").status, 200) << what;
+        EXPECT_EQ(ask(what, {{"window", "5,5"}}, "image/jpeg").status, 200) << what;
+        store(aGreyImage(), "24");
+        EXPECT_EQ(ask(what, {}, "image/jpeg").status, 200) << what << " corrected";
+        mHeld = tagOf(ask(what, {}, "image/jpeg"));
+        DatasetBuilder other = aGreyImage();
+        other.dataset().putAndInsertUint16Array(
+            DCM_PixelData, std::vector<Uint16>(kFrames * kSide * kSide, 7).data(), kFrames * kSide * kSide);
+        DcmFileFormat file(&other.dataset());
+        ASSERT_TRUE(file.saveFile(mFile.constData(), EXS_LittleEndianExplicit).good());
+        EXPECT_EQ(ask(what, {}, "image/jpeg").status, 200) << what << " of other pixels";
+        ASSERT_TRUE(QFile::remove(QFile::decodeName(mFile)));
+        EXPECT_EQ(ask(what, {}, "image/jpeg").status, 410) << what;
+    }
+    mHeld.clear();
+    store(aGreyImage());
+    EXPECT_NE(tagOf(ask("rendered", {}, "image/jpeg")), tagOf(ask("rendered", {}, "image/png")));
+}
+
+TEST_F(RenderTest, ShowsADocumentAsItIs)
+{
+    const QByteArray document = QByteArray("%PDF-") + QByteArray(4995, 'x');
+    DatasetBuilder image = anImage("1.4").inStudy("1.2").inSeries("1.3");
+    image.with(DCM_MIMETypeOfEncapsulatedDocument, "application/pdf");
+    auto* element = new DcmOtherByteOtherWord(DCM_EncapsulatedDocument);
+    element->putUint8Array(reinterpret_cast<const Uint8*>(document.constData()),
+                           static_cast<Uint32>(document.size()));
+    store(image.with(element));
+    for (const char* accept : {"*/*", "application/pdf", "image/webp,application/pdf;q=0.5"}) {
+        Http::Response shown = ask("rendered", {}, accept);
+        ASSERT_EQ(shown.status, 200) << accept;
+        EXPECT_EQ(shown.headers.first().value, "application/pdf");
+        QByteArray bytes;
+        const auto& range = std::get<Http::FileRange>(shown.body.front());
+        ASSERT_TRUE(range.file->read(range.offset, range.length, bytes).good());
+        EXPECT_EQ(bytes, document);
+    }
+    EXPECT_EQ(ask("rendered", {}, "image/jpeg").status, 406);
+    mHeld = tagOf(ask("rendered", {}, "*/*"));
+    EXPECT_EQ(ask("rendered", {}, "*/*").status, 304);
+    store(
+        anImage("1.4").inStudy("1.2").inSeries("1.3").with(DCM_MIMETypeOfEncapsulatedDocument, "text/html"));
+    EXPECT_EQ(ask("rendered", {}, "*/*").status, 404) << "nothing that a browser would run";
 }
 
 }  // namespace

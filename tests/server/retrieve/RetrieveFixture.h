@@ -1,8 +1,10 @@
 #pragma once
 
+#include "server/dicomweb/render/RenderedResource.h"
 #include "server/dicomweb/retrieve/BulkDataResource.h"
 #include "server/dicomweb/retrieve/FramesResource.h"
 #include "server/dicomweb/retrieve/InstancesResource.h"
+#include "server/dicomweb/uri/UriResource.h"
 #include "support/DatasetBuilder.h"
 #include "support/FileContent.h"
 #include "support/LogCapture.h"
@@ -64,11 +66,11 @@ protected:
         DcmRLEEncoderRegistration::registerCodecs();
         DcmRLEDecoderRegistration::registerCodecs();
         LogFile::setCallback([](LogFile::Severity, const char*, const std::string&) {});
-        const auto studies = std::make_shared<StudyShelf>(1 << 26, std::chrono::nanoseconds(-1'000'000'000));
-        const auto objects = std::make_shared<ObjectShelf>(1 << 20);
-        mResources.push_back(std::make_unique<FramesResource>(studies, objects));
-        mResources.push_back(std::make_unique<InstancesResource>(studies, objects));
-        mResources.push_back(std::make_unique<BulkDataResource>(studies, objects));
+        mResources.push_back(std::make_unique<FramesResource>(mStudies, mObjects));
+        mResources.push_back(std::make_unique<InstancesResource>(mStudies, mObjects));
+        mResources.push_back(std::make_unique<BulkDataResource>(mStudies, mObjects));
+        mResources.push_back(std::make_unique<RenderedResource>(mStudies, mObjects));
+        mResources.push_back(std::make_unique<UriResource>(mStudies, mObjects));
     }
     ~RetrieveTest() override { LogFile::setCallback(nullptr); }
 
@@ -83,14 +85,14 @@ protected:
         ASSERT_TRUE(file.saveFile(path(name).toLocal8Bit().constData(), syntax).good());
     }
 
-    /// Puts the file into its study's tag file.
-    void add(const QString& path)
+    /// Puts the file into its study's tag file, as if it lay in `place`, which may be a URL.
+    void add(const QString& path, const QByteArray& place = {})
     {
         DcmFileFormat file;
         TagFile study;
         ASSERT_TRUE(readDicomFile(path.toLocal8Bit().constData(), file).good()) << qPrintable(path);
         std::unique_ptr<TagMap> map(TagMap::createTagMap(file.getDataset(), kDefaultValueBound));
-        map->putAndInsertValue(kFilePath, VrCode::LO, path.toLocal8Bit());
+        map->putAndInsertValue(kFilePath, VrCode::LO, place.isEmpty() ? path.toLocal8Bit() : place);
         study.addTagMap(map.release(), nullptr, true);
         ASSERT_TRUE(study.mergeIntoCacheFile());
     }
@@ -123,6 +125,11 @@ protected:
         request.headers = {{"accept", accept}};
         if (!range.isEmpty())
             request.headers.append({"range", range});
+        return get(path, request);
+    }
+
+    Http::Response get(const QByteArray& path, const Http::Request& request)
+    {
         ResourcePath parsed;
         if (!ResourcePath::parse(path.split('/').toVector(), parsed))
             return Http::failure(404, QStringLiteral("no path"));
@@ -193,6 +200,9 @@ protected:
     }
 
     TemporaryStore mStore;
+    std::shared_ptr<StudyShelf> mStudies =
+        std::make_shared<StudyShelf>(1 << 26, std::chrono::nanoseconds(-1'000'000'000));
+    std::shared_ptr<ObjectShelf> mObjects = std::make_shared<ObjectShelf>(1 << 20);
     std::vector<std::unique_ptr<Resource>> mResources;
 };
 

@@ -1,15 +1,14 @@
 #include "kddlib/archive/CorrectedDataset.h"
 
 #include "kddlib/Limits.h"
+#include "kddlib/archive/PixelDescription.h"
 #include "kddlib/net/dicom/DicomFileReader.h"
 #include "kddlib/tagfile/qa/ImageIdentity.h"
 #include "kddlib/tagfile/qa/QAEditor.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/tagmodel/TagSequence.h"
-#include "platform/volume/FragmentReader.h"
 #include "platform/volume/KxCompressedDataMedia.h"
-#include "platform/volume/StoredFrame.h"
 
 #include <QtEndian>
 
@@ -175,68 +174,44 @@ private:
     bool mHasChanged = false;
 };
 
-/// What decoding makes of the attributes that tell how pixels are stored.
-void describeDecoded(DcmDataset& dataset, const FrameIndex& index)
+using Pixels = CorrectedDataset::Pixels;
+
+/// The length of an element that ends with a delimiter, beyond what any other can have.
+constexpr qint64 kUndefinedLength = 0xffffffff;
+
+Pixels pixelsFor(const FrameIndex& index, const QByteArray& syntaxUID)
 {
-    for (const DcmTagKey& key :
-         {DcmTagKey(0x7fe0, 0x0001), DcmTagKey(0x7fe0, 0x0002), DcmTagKey(0x7fe0, 0x0003)})
-        dataset.findAndDeleteElement(key);
-    const QByteArray photometric = index.decodedPhotometric();
-    if (!photometric.isEmpty())
-        dataset.putAndInsertString(DCM_PhotometricInterpretation, photometric.constData());
-    if (dataset.tagExists(DCM_PlanarConfiguration))
-        dataset.putAndInsertUint16(DCM_PlanarConfiguration, 0);
+    if (!index.hasPixels())
+        return Pixels::None;
+    if (syntaxUID == index.transferSyntaxUID())
+        return Pixels::Stored;
+    if (index.encodings().contains(syntaxUID))
+        return Pixels::Encoded;
+    return index.isEncapsulated() ? Pixels::Decoded : Pixels::Stored;
 }
 
-/// Icons are compressed as the image is, and are decoded with it.
-Result decodeIcon(DcmItem& item)
+qint64 lengthOf(const FrameIndex& index, Pixels pixels)
 {
-    DcmElement* element = nullptr;
-    E_TransferSyntax xfer = EXS_Unknown;
-    StoredFrame icon;
-    if (item.findAndGetElement(DCM_PixelData, element).bad() || findFragments(*element, xfer) == nullptr)
-        return {};
-    Result result = readStoredFrame(item, 0, 0, icon);
-    const bool isWide = sizeOf(icon.pixels.type) > 1;
-    QByteArray pixels = icon.pixels.pixels;
-    pixels.append(pixels.size() % 2, '\0');
-    auto native = std::make_unique<DcmPixelData>(DcmTag(DCM_PixelData, isWide ? EVR_OW : EVR_OB));
-    native->putUint8Array(reinterpret_cast<const Uint8*>(pixels.constData()),
-                          static_cast<Uint32>(pixels.size()));
-    if (result.good() && icon.pixels.components == 3) {
-        const bool isRgb = icon.colour == StoredFrame::Colour::Rgb;
-        item.putAndInsertString(DCM_PhotometricInterpretation, isRgb ? "RGB" : "YBR_FULL");
-        item.putAndInsertUint16(DCM_PlanarConfiguration, 0);
+    switch (pixels) {
+    case Pixels::None:
+        return 0;
+    case Pixels::Stored:
+        return index.pixelValue().length;
+    case Pixels::Decoded:
+        return DecodedPixels::lengthOf(index);
+    case Pixels::Encoded:
+        break;
     }
-    if (result.good() && item.insert(native.get(), OFTrue).good())
-        static_cast<void>(native.release());
-    return result.within(QStringLiteral("The icon"));
+    return -1;
 }
 
-/// Those in sequences; the image's own pixels are not in the dataset.
-Result decodeIcons(DcmItem& item, int depth)
-{
-    Result result;
-    for (DcmObject* object = item.nextInContainer(nullptr); object != nullptr && result.good();
-         object = item.nextInContainer(object)) {
-        if (object->ident() != EVR_SQ || depth >= kMaxItemDepth)
-            continue;
-        auto& items = static_cast<DcmSequenceOfItems&>(*object);
-        for (DcmObject* next = items.nextInContainer(nullptr); next != nullptr && result.good();
-             next = items.nextInContainer(next)) {
-            result = decodeIcon(static_cast<DcmItem&>(*next));
-            if (result.good())
-                result = decodeIcons(static_cast<DcmItem&>(*next), depth + 1);
-        }
-    }
-    return result;
-}
-
-QByteArray decodedVr(DcmDataset& dataset)
+QByteArray vrOf(const FrameIndex& index, Pixels pixels, DcmDataset& dataset)
 {
     Uint16 bits = 0;
+    if (pixels == Pixels::Stored)
+        return index.pixelVr();
     dataset.findAndGetUint16(DCM_BitsAllocated, bits);
-    return bits > 8 ? "OW" : "OB";
+    return pixels == Pixels::Decoded && bits > 8 ? "OW" : "OB";
 }
 
 template <typename Object, typename... Arguments>
@@ -302,17 +277,15 @@ Result writeMeta(DcmFileFormat& dicom, const TagMap& image, const QByteArray& sy
                                               QString::fromLatin1(condition.text()));
 }
 
-/// The tag, VR and length of the element with the pixels; of encapsulated ones the length is undefined.
-QByteArray pixelHead(const FrameIndex& index, bool isExplicit, bool isEncapsulated, const QByteArray& vr,
-                     qint64 length)
+/// The tag, VR and length of the element with the pixels.
+QByteArray pixelHead(const FrameIndex& index, bool isExplicit, const QByteArray& vr, qint64 length)
 {
     QByteArray head(isExplicit ? 12 : 8, 0);
     qToLittleEndian<quint16>(index.pixelKey().getGroup(), head.data());
     qToLittleEndian<quint16>(index.pixelKey().getElement(), head.data() + 2);
     if (isExplicit)
         head.replace(4, 2, vr);
-    qToLittleEndian<quint32>(isEncapsulated ? 0xffffffff : static_cast<quint32>(length),
-                             head.data() + head.size() - 4);
+    qToLittleEndian<quint32>(static_cast<quint32>(length), head.data() + head.size() - 4);
     return head;
 }
 
@@ -350,38 +323,37 @@ Result CorrectedDataset::make(MediaSource& file, const FrameIndex& index, const 
 
     CorrectedDataset made;
     made.mIsAsInFile = isStored && !correction.hasChanged();
-    const bool isDecoded = index.isEncapsulated() && !isStored;
-    if (index.hasPixels()) {
-        made.mPixels = isDecoded ? Pixels::Decoded : Pixels::Stored;
-        made.mPixelLength = isDecoded ? DecodedPixels::lengthOf(index) : index.pixelValue().length;
-        if (made.mPixelLength >= 0xffffffff && !index.isEncapsulated())
-            return Result::failure(QStringLiteral("The pixels are too long for one attribute"));
-    }
-    if (isDecoded && (made.mPixelLength <= 0 || made.mPixelLength >= 0xffffffff))
-        return Result::failure(QStringLiteral("The decoded pixels are too long for one attribute"));
-    if (isDecoded) {
-        describeDecoded(dataset, index);
-        result = decodeIcons(dataset, 0);
+    made.mPixels = pixelsFor(index, syntaxUID);
+    made.mPixelLength = lengthOf(index, made.mPixels);
+    const bool isOpen =
+        made.mPixels == Pixels::Encoded || (made.mPixels == Pixels::Stored && index.isEncapsulated());
+    if (made.mPixelLength >= kUndefinedLength && !isOpen)
+        return Result::failure(QStringLiteral("The pixels are too long for one attribute"));
+    if (made.mPixels == Pixels::Decoded && made.mPixelLength <= 0)
+        return Result::failure(QStringLiteral("It is not told how large the pixels are"));
+    if (made.mPixels == Pixels::Decoded || made.mPixels == Pixels::Encoded) {
+        describePixels(dataset, made.mPixels == Pixels::Decoded ? index.decodedPhotometric()
+                                                                : index.encodedPhotometric());
+        result = decodeIcons(dataset);
         if (result.bad())
             return result;
     }
     const std::unique_ptr<DcmDataset> tail = takeTail(dataset);
     E_TransferSyntax xfer = isExplicit ? EXS_LittleEndianExplicit : EXS_LittleEndianImplicit;
     // Icons may be compressed as well.
-    if (index.isEncapsulated() && !isDecoded && dataset.getOriginalXfer() != EXS_Unknown)
+    if (index.isEncapsulated() && isStored && dataset.getOriginalXfer() != EXS_Unknown)
         xfer = dataset.getOriginalXfer();
     result = writeMeta(dicom, image, syntaxUID, made.mHead);
+    made.mMetaLength = made.mHead.size();
     if (result.good())
         result = written(dataset, made.mHead, xfer, EGL_withoutGL);
     if (result.good() && tail->card() > 0)
         result = written(*tail, made.mTail, xfer, EGL_withoutGL);
     if (result.bad())
         return result;
-    if (index.hasPixels()) {
-        const QByteArray vr = isDecoded ? decodedVr(dataset) : index.pixelVr();
-        made.mHead +=
-            pixelHead(index, isExplicit, index.isEncapsulated() && !isDecoded, vr, made.mPixelLength);
-    }
+    if (index.hasPixels())
+        made.mHead += pixelHead(index, isExplicit, vrOf(index, made.mPixels, dataset),
+                                isOpen ? kUndefinedLength : made.mPixelLength);
     *this = made;
     return {};
 }

@@ -41,14 +41,14 @@ class KDD_EXPORT CorrectedDataset
 public:
     /// Where the pixels come from.
     enum class Pixels {
-        None,    ///< there are none
-        Stored,  ///< the bytes of the file's `pixelValue`
-        Decoded,  ///< each frame as `FrameIndex::readDecoded` gives it, single bits without gaps between frames, and a
-                  ///< NUL if the length is odd
+        None,     ///< there are none
+        Stored,   ///< the bytes of the file's `pixelValue`
+        Decoded,  ///< as `DecodedPixels` gives them
+        Encoded,  ///< as `EncodedPixels` gives them
     };
 
-    /// Makes it from the image's file and what was found in it. `syntaxUID` is the file's own transfer syntax, or
-    /// explicit or implicit VR little endian. Fails when the file cannot be read, or does not have what the tag file
+    /// Makes it from the image's file and what was found in it. `syntaxUID` is the file's own transfer syntax, one of
+    /// its `FrameIndex::encodings`, or explicit, implicit or deflated VR little endian. Fails when the file cannot be read, or does not have what the tag file
     /// left out, so that it cannot be the one that the image was made from; nothing is changed then.
     Result make(MediaSource& file, const FrameIndex& index, const TagMap& image, const QByteArray& syntaxUID);
 
@@ -56,21 +56,27 @@ public:
     bool isAsInFile() const { return mIsAsInFile; }
 
     const QByteArray& head() const { return mHead; }
+
+    /// How much of the head is preamble and meta header [bytes]. In deflated syntax whatever follows has yet to be
+    /// deflated, pixels and tail included.
+    int metaLength() const { return mMetaLength; }
     const QByteArray& tail() const { return mTail; }
     Pixels pixels() const { return mPixels; }
 
-    /// Of the pixels [bytes].
+    /// Of the pixels [bytes]; of encoded ones, which nobody knows before, -1.
     qint64 pixelLength() const { return mPixelLength; }
 
 private:
     QByteArray mHead;
     QByteArray mTail;
+    int mMetaLength = 0;
     Pixels mPixels = Pixels::None;
     qint64 mPixelLength = 0;
     bool mIsAsInFile = false;
 };
 
-/// The decoded pixels of a file in blocks, as a dataset holds them. The source must outlive it. Used by one thread at a
+/// The decoded pixels of a file in blocks, as a dataset holds them: frame after frame as `FrameIndex::readDecoded` gives
+/// it, single bits without gaps between frames, and a NUL if the length is odd. The source must outlive it. Used by one thread at a
 /// time.
 class KDD_EXPORT DecodedPixels
 {
@@ -96,6 +102,30 @@ private:
     int mBits = 0;          // of the last byte that are not given yet
     unsigned mPending = 0;  // those
     qint64 mGiven = 0;      // [bytes]
+};
+
+/// The pixels of a file in blocks, as a dataset in another transfer syntax with compression holds them: an empty table of
+/// offsets, a fragment for each frame as `FrameIndex::readEncoded` gives it, and the delimiter. The source must outlive
+/// it. Used by one thread at a time.
+class KDD_EXPORT EncodedPixels
+{
+public:
+    EncodedPixels(MediaSource& file, const FrameIndex& index, const QByteArray& syntaxUID)
+        : mFile(file)
+        , mIndex(index)
+        , mSyntaxUID(syntaxUID)
+    {
+    }
+
+    /// Replaces `block` by the next bytes, those of a frame; empty at the end.
+    Result next(QByteArray& block);
+
+private:
+    MediaSource& mFile;
+    FrameIndex mIndex;
+    QByteArray mSyntaxUID;
+    int mFrame = 0;
+    bool mIsEnded = false;
 };
 
 }  // namespace Kdd

@@ -99,6 +99,16 @@ public:
 
     QByteArray decodedPhotometric() const;
 
+    /// The transfer syntaxes with compression in which frames can be given beside the stored one, without loss of what
+    /// decoding gives; those that cost least come first. Empty when there is no decoder for the stored one.
+    QVector<QByteArray> encodings() const;
+
+    /// The bytes of a frame in one of `encodings`, an even number. Samples are side by side, chroma is not shared.
+    Result readEncoded(MediaSource& file, int frame, const QByteArray& syntaxUID, QByteArray& bytes) const;
+
+    /// What the samples mean then.
+    QByteArray encodedPhotometric() const;
+
     // ---- other values
 
     /// Where the value of an attribute lies, also of one in sequences. False when it is not there.

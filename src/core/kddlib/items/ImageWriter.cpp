@@ -73,19 +73,25 @@ bool ImageWriter::isWanted(const DcmTagKey& key) const
            (mWanted.isEmpty() || std::binary_search(mWanted.begin(), mWanted.end(), key));
 }
 
+void ImageWriter::forgetAbove()
+{
+    for (Above& texts : mAbove) {
+        for (NodeText& text : texts)
+            text.node = nullptr;
+    }
+}
+
 void ImageWriter::append(QByteArray& out, const TagMap& node, const QByteArray& root, Entries entries)
 {
     if (mConversion == nullptr || !mConversion->isFor(node)) {
         mConversion = std::make_unique<TextConversion>(node);
-        mAbove[0].node = mAbove[1].node = nullptr;
+        forgetAbove();
     }
     mConversion->restart();
     const int begin = out.size();
     unsigned int findings = 0;
     do {
         out.truncate(begin);
-        if (mConversion->way() != std::exchange(mWay, mConversion->way()))
-            mAbove[0].node = mAbove[1].node = nullptr;
         findings = appendOnce(out, node, root, Entries::Merged);
     } while (mConversion->nextWay(findings));
     if (entries == Entries::Merged)
@@ -116,9 +122,10 @@ unsigned int ImageWriter::appendOnce(QByteArray& out, const TagMap& node, const 
 const ImageWriter::NodeText* ImageWriter::textAbove(const TagMap& node, int level)
 {
     const TagMap* parent = node.parent();
-    if (parent == nullptr || level >= static_cast<int>(std::size(mAbove)))
+    Above& texts = mAbove[static_cast<int>(mConversion->way())];
+    if (parent == nullptr || level >= static_cast<int>(texts.size()))
         return nullptr;
-    NodeText& above = mAbove[level];
+    NodeText& above = texts[static_cast<std::size_t>(level)];
     if (above.node == parent)
         return &above;
     const NodeText* further = textAbove(*parent, level + 1);

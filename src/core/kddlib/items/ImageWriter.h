@@ -8,6 +8,7 @@
 
 #include <dcmtk/dcmdata/dctagkey.h>
 
+#include <array>
 #include <memory>
 
 namespace Kdd
@@ -52,6 +53,9 @@ private:
         unsigned int findings = 0;
     };
 
+    /// Of the series, and of the study.
+    using Above = std::array<NodeText, 2>;
+
     /// Where attributes go: into a text to be copied, or after the address into an image's own.
     struct Target
     {
@@ -70,6 +74,7 @@ private:
     };
 
     bool isWanted(const DcmTagKey& key) const;
+    void forgetAbove();
     const NodeText* textAbove(const TagMap& node, int level);
     void write(Target& target, const TagMap& node, const NodeText* above);
     unsigned int appendOnce(QByteArray& out, const TagMap& node, const QByteArray& root, Entries entries);
@@ -92,8 +97,7 @@ private:
     QVector<DcmTagKey> mWanted;
     Entries mEntries = Entries::Merged;
     std::unique_ptr<TextConversion> mConversion;
-    TextConversion::Way mWay = TextConversion::Way::Together;  // by which the texts above were written
-    NodeText mAbove[2];                                        // of the series, and of the study
+    Above mAbove[TextConversion::kWays];  // as each way gives it
 };
 
 }  // namespace Kdd

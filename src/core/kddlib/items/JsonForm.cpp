@@ -268,6 +268,11 @@ void JsonForm::endOmitted(QByteArray& out) const
 
 QByteArray JsonForm::addressPart(const QByteArray& text) const
 {
+    const bool isPlain = std::all_of(text.begin(), text.end(), [](char c) {
+        return c >= ' ' && c <= '~' && c != '"' && c != '\\';
+    });
+    if (isPlain)
+        return text;
     std::ostringstream escaped;
     DcmJsonFormat::escapeControlCharacters(escaped,
                                            OFString(text.constData(), static_cast<size_t>(text.size())));

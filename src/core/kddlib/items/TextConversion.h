@@ -27,6 +27,7 @@ public:
         Each,      ///< each by the set of its item, else by what it looks like
         AsStored,
     };
+    static constexpr int kWays = 3;
 
     // What was met under way that decides whether it was the right one; bits.
     static constexpr unsigned int kUnexplained = 1;   ///< together: the declared set does not explain a text

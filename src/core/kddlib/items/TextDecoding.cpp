@@ -40,13 +40,33 @@ bool decodeWith(const char* codecName, const QByteArray& bytes, QString& text)
     return state.invalidChars == 0 && state.remainingChars == 0;
 }
 
+/// A converter for one character set. Selecting a set makes the system look for its tables, which takes longer than to
+/// convert a name; texts that follow each other mostly have the same.
+struct SelectedConverter
+{
+    bool select(const QByteArray& wanted)
+    {
+        if (isGood && wanted == characterSet)
+            return true;
+        characterSet = wanted;
+        isGood = converter.selectCharacterSet(wanted.constData()).good();
+        return isGood;
+    }
+
+    QByteArray characterSet;
+    DcmSpecificCharacterSet converter;
+    bool isGood = false;
+};
+
 bool decodeByDeclaration(const QByteArray& bytes, const QByteArray& characterSet, QString& text)
 {
-    DcmSpecificCharacterSet converter;
+    thread_local SelectedConverter tSelected;
     OFString converted;
-    return converter.selectCharacterSet(characterSet.constData()).good() &&
-           converter.convertString(bytes.constData(), converted, kDelimiters).good() &&
-           decodeWith("UTF-8", QByteArray::fromStdString(converted), text);
+    if (!tSelected.select(characterSet))
+        return false;
+    // One that met what it cannot convert is used no further: it may stand in the middle of a text.
+    tSelected.isGood = tSelected.converter.convertString(bytes.constData(), converted, kDelimiters).good();
+    return tSelected.isGood && decodeWith("UTF-8", QByteArray::fromStdString(converted), text);
 }
 
 /// Kanji come behind escape sequences, katakana as single bytes of JIS X 0201.

@@ -58,8 +58,7 @@ const CharacterSet* findCharacterSet(QByteArray name)
     name.replace('_', ' ');
     const auto* const found =
         std::find_if(std::begin(kCharacterSets), std::end(kCharacterSets), [&](const CharacterSet& set) {
-            return name == set.number || name.endsWith(QByteArray(" ") + set.number) ||
-                   name.endsWith(QByteArray("ISO ") + set.number);
+            return name == set.number || name.endsWith(QByteArray(" ") + set.number);
         });
     return found != std::end(kCharacterSets) ? found : nullptr;
 }

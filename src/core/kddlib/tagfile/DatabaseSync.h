@@ -17,8 +17,8 @@ namespace Kdd
 class StoredStudy;
 class StudyTree;
 
-/// Brings a tree into line with what the database says of its study: file paths, volume names, series that are gone. An
-/// image that a correction moved here or renamed stays. Another study's entry is refused. Whether anything changed.
+/// Brings a tree into line with what the database says of its study: file paths, volume names, images that are gone,
+/// series that are gone or new. An image that a correction moved here or renamed stays. Another study's entry is refused. Whether anything changed.
 bool syncWithDatabase(StudyTree& tree, const std::shared_ptr<Kxg::DicomDirectoryEntry>& study);
 
 /// Reads the study's tag file and brings it into line with the image database, in memory only. False when the database

@@ -86,11 +86,18 @@ QTime timeOf(const QByteArray& text)
     return {text.mid(0, 2).toInt(), text.mid(2, 2).toInt(), text.mid(4, 2).toInt()};
 }
 
+/// A day or a time that does not exist is no value.
+template <typename Moment>
+QVariant ifValid(const Moment& moment)
+{
+    return moment.isValid() ? QVariant(moment) : QVariant();
+}
+
 /// Eight digits only. The form with dots that the oldest files have counts as malformed.
 QVariant asDate(const QByteArray& text)
 {
     const QByteArray trimmed = text.trimmed();
-    return trimmed.size() == 8 ? QVariant(dateOf(trimmed)) : QVariant();
+    return trimmed.size() == 8 ? ifValid(dateOf(trimmed)) : QVariant();
 }
 
 /// The fraction of a second is left out. DICOM lets minutes and seconds be missing; such a time
@@ -98,7 +105,7 @@ QVariant asDate(const QByteArray& text)
 QVariant asTime(const QByteArray& text)
 {
     const QByteArray trimmed = text.trimmed().left(6);
-    return trimmed.size() == 6 ? QVariant(timeOf(trimmed)) : QVariant();
+    return trimmed.size() == 6 ? ifValid(timeOf(trimmed)) : QVariant();
 }
 
 /// Fraction and time zone are left out, as the result is a local time in whole seconds.
@@ -107,7 +114,7 @@ QVariant asDateTime(const QByteArray& text)
     const QByteArray trimmed = text.trimmed().left(14);
     if (trimmed.size() != 14)
         return {};
-    return QDateTime(dateOf(trimmed), timeOf(trimmed.mid(8)));
+    return ifValid(QDateTime(dateOf(trimmed), timeOf(trimmed.mid(8))));
 }
 
 QVariant typedValue(const QByteArray& text, VrCode vr)

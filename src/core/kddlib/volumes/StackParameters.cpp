@@ -106,7 +106,7 @@ void insertAttribute(ParamBundle& bundle, const TagMap& image, const DcmTagKey& 
 {
     QByteArray text;
     const TagElement* element = image.findElement(key);
-    if (element != nullptr && image.findAndGetString(key, text))
+    if (element != nullptr && !element->markedAsOmitted() && image.findAndGetString(key, text))
         bundle.insert(nameOf(key), Parameter::ofText(QByteArray(vrName(element->vr())) + ':' + text));
 }
 

@@ -2,7 +2,7 @@
 
 import { getCorrections } from './api.js';
 import { h, state } from './dom.js';
-import { amount, spaced, tagText } from './format.js';
+import { amount, logTime, spaced, tagText } from './format.js';
 import { hints } from './keys.js';
 import { imageLink, loadStudy, studyHead, studyLink } from './study.js';
 
@@ -19,8 +19,10 @@ function change(one) {
 
 function panel(study, correction) {
   const { images, count } = correction;
+  const [moment, who] = logTime(correction.time);
   return h('article', { class: 'panel correction' },
-    h('header', {}, h('h2', { class: 'value' }, correction.time || 'Unknown time'), h('span', { class: 'soft' }, amount(count, 'image'))),
+    h('header', {}, h('h2', { class: 'value' }, moment || 'Unknown time'),
+      who && h('span', { class: 'value' }, who), h('span', { class: 'soft' }, amount(count, 'image'))),
     h('div', { class: 'changes', role: 'table', 'aria-label': 'Changes' }, correction.changes.map(change)),
     h('details', { class: 'concerned' }, h('summary', {}, 'Images'),
       h('ul', {}, images.map((key) => h('li', {}, h('a', { href: imageLink(study, key) }, key))),

@@ -35,6 +35,15 @@ export function time(text) {
   return found ? `${found[1]}:${found[2]}` : (text ?? '');
 }
 
+/** "1/6/2026 9:30:00 PM anna", as audit logs have it with the day first, as ["2026-06-01 21:30:00", "anna"]. */
+export function logTime(text) {
+  const found = /^(\d{1,2})\/(\d{1,2})\/(\d{4}) (\d{1,2}):(\d{2}:\d{2}) ([AP])M(.*)$/s.exec(text);
+  if (!found) return [text, ''];
+  const two = (number) => String(number).padStart(2, '0');
+  const [, day, month, year, hour, rest, half, who] = found;
+  return [`${year}-${two(month)}-${two(day)} ${two((hour % 12) + (half === 'P' ? 12 : 0))}:${rest}`, who.trim()];
+}
+
 /** At the study's day: from the birth date where that is known, else as the study says: "42 y", "7 m". */
 export function age(birth, day, told) {
   const from = /^(\d{4})(\d{2})(\d{2})$/.exec(birth ?? '');

@@ -7,7 +7,8 @@ import { hints, isTyping, roving, vertical } from './keys.js';
 
 const pageSize = 50;
 const pause = 220; // [ms] without a key before the server is asked
-const modalities = ['CR', 'CT', 'DX', 'ECG', 'MG', 'MR', 'NM', 'OT', 'PR', 'PT', 'RF', 'SC', 'SEG', 'SR', 'US', 'XA'];
+const modalities = ['CR', 'CT', 'DOC', 'DX', 'ECG', 'ES', 'IO', 'IVUS', 'KO', 'MG', 'MR', 'NM', 'OCT', 'OP', 'OPT', 'OT', 'PR', 'PT', 'PX',
+  'RF', 'RTDOSE', 'RTIMAGE', 'RTPLAN', 'RTSTRUCT', 'SC', 'SEG', 'SM', 'SR', 'US', 'XA', 'XC'];
 const terms = ['name', 'id', 'accession', 'from', 'to', 'modality'];
 
 // Where one was in the list, to come back there.

@@ -83,7 +83,8 @@ bool KeptAnswers::find(const QByteArray& name, Http::FileRange& answer)
     if (mCapacity <= 0)
         return false;
     Result result;
-    answer.file = Http::OpenFile::open(pathOf(name), result);
+    // Its content never changes, but its times tell of its use.
+    answer.file = Http::OpenFile::open(pathOf(name), result, Http::OpenFile::Changes::Ignored);
     // What a crash of the machine left may have a name and nothing else.
     if (answer.file == nullptr || answer.file->size() == 0)
         return false;

@@ -10,6 +10,11 @@ namespace
 // So few images are written faster than a file is opened, and their length is known before the first byte goes.
 constexpr int kFew = 4;
 
+// Of a block of text, with the image that goes beyond its end and what frames it; of a compressed one. Memory that is
+// asked for anew for each block costs more than what is written into it.
+constexpr int kPlainBlock = 96 * 1024;       // [bytes]
+constexpr int kCompressedBlock = 16 * 1024;  // [bytes]
+
 class PlainProducer : public Http::Producer
 {
 public:
@@ -21,6 +26,7 @@ public:
     Result next(QByteArray& block) override
     {
         block.resize(0);
+        block.reserve(kPlainBlock);
         mText->next(block);
         return {};
     }
@@ -46,9 +52,11 @@ public:
             mDraft = mKept.begin(mName);
         mIsBegun = true;
         block.resize(0);
-        // An empty block would be the end, so texts that give nothing yet are followed by the next.
-        while (block.isEmpty() && !mIsEnded) {
+        block.reserve(3 * kCompressedBlock);
+        // An empty block would be the end, and a small one is not worth sending: other texts follow.
+        while (block.size() < kCompressedBlock && !mIsEnded) {
             mPlain.resize(0);
+            mPlain.reserve(kPlainBlock);
             mIsEnded = !mText->next(mPlain);
             if (mIsEnded)
                 mEncoder.finish(block);
@@ -80,13 +88,7 @@ QByteArray wholeBody(MetadataText& text, bool takesGzip)
     QByteArray plain;
     while (text.next(plain)) {
     }
-    if (!takesGzip)
-        return plain;
-    QByteArray compressed;
-    Http::GzipEncoder encoder;
-    encoder.add(plain, compressed);
-    encoder.finish(compressed);
-    return compressed;
+    return takesGzip ? Http::gzipped(plain) : plain;
 }
 
 }  // namespace

@@ -39,7 +39,10 @@ Verdict PictureForm::choose(const Http::AcceptHeader& accept, PictureForm& form)
 
 QImage fitInto(const QImage& picture, const RenderRequest& rendering)
 {
-    const SourceRegion& region = rendering.region;
+    SourceRegion region = rendering.region;
+    if (region.isRelative)
+        region = {region.x * picture.width(), region.y * picture.height(), region.width * picture.width(),
+                  region.height * picture.height(), false};
     int x = 0;
     int y = 0;
     int width = 0;

@@ -10,9 +10,6 @@ namespace Kdd::DicomWeb
 namespace
 {
 
-// A wall of displays. A larger picture would be made of repeated pixels and take memory of the server's.
-constexpr int kLongestSide = 8192;
-
 /// Numbers between commas; an empty one is left at its default. False when one is none, or too many or few are there.
 bool readNumbers(const QByteArray& text, int least, QVector<double>& numbers)
 {
@@ -41,7 +38,7 @@ bool readViewport(const QByteArray& text, RenderRequest& rendering)
     if (numbers[2] < 0 || numbers[3] < 0)
         return false;
     rendering.viewport = QSize(static_cast<int>(numbers[0]), static_cast<int>(numbers[1]));
-    rendering.region = {numbers[2], numbers[3], numbers[4], numbers[5]};
+    rendering.region = {numbers[2], numbers[3], numbers[4], numbers[5], false};
     return true;
 }
 
@@ -108,6 +105,22 @@ Verdict RenderRequest::parse(const Http::Request& request, RenderRequest& render
                              .arg(QLatin1String(each.name), QLatin1String(each.form))};
     }
     return {};
+}
+
+QByteArray RenderRequest::text() const
+{
+    constexpr int kDigits = 17;  // all that a number has
+    QByteArray text;
+    const auto add = [&](double number) { text += QByteArray::number(number, 'g', kDigits) + ','; };
+    for (const double number : {double(viewport.width()), double(viewport.height()), region.x, region.y,
+                                region.width, region.height, double(region.isRelative), double(quality)})
+        add(number);
+    if (window) {
+        add(window->center);
+        add(window->width);
+        add(static_cast<int>(window->function));
+    }
+    return text;
 }
 
 }  // namespace Kdd::DicomWeb

@@ -1,9 +1,12 @@
 #include "server/dicomweb/render/RenderedResource.h"
 
 #include "server/dicomweb/render/PictureForm.h"
+#include "server/dicomweb/render/PictureTag.h"
 #include "server/dicomweb/render/ShownImage.h"
+#include "server/dicomweb/render/WholeValue.h"
 #include "server/dicomweb/retrieve/EntriesProducer.h"
 #include "server/dicomweb/retrieve/ImageFinder.h"
+#include "server/http/EntityTag.h"
 #include "server/http/MultipartWriter.h"
 
 #include <QList>
@@ -65,6 +68,25 @@ Verdict drawn(const ServedStudy& study, const Wanted& wanted, const RenderReques
         return verdict;
     bytes = encode(picture, mediaType, rendering.quality);
     return bytes.isEmpty() ? Verdict{500, QStringLiteral("The picture cannot be written")} : Verdict{};
+}
+
+Http::Response one(const Http::Request& request, const ServedStudy& study, const Wanted& wanted,
+                   const RenderRequest& rendering, const QByteArray& mediaType, ObjectShelf& objects)
+{
+    const PictureTag picture{wanted.image,
+                             QByteArray::number(wanted.frame) + '\n' + rendering.text() + mediaType};
+    QByteArray tag;
+    QByteArray bytes;
+    Verdict verdict = picture.ofDrawn(study, objects, tag);
+    if (verdict.good() && Http::hasEntity(request, tag))
+        return Http::notModified(tag);
+    if (verdict.good())
+        verdict = drawn(study, wanted, rendering, mediaType, bytes);
+    if (verdict.bad())
+        return verdict.response();
+    Http::Response response = Http::textResponse(200, mediaType, bytes);
+    Http::addEntityTag(tag, response);
+    return response;
 }
 
 /// All pictures of what a path names.
@@ -138,19 +160,31 @@ bool RenderedResource::owns(const ResourcePath& path) const
 Http::Response RenderedResource::answer(const Http::Request& request, const ResourcePath& path)
 {
     RenderRequest rendering;
+    const Verdict verdict = RenderRequest::parse(request, rendering);
+    return verdict.good() ? show(request, Http::AcceptHeader::of(request), rendering, path)
+                          : verdict.response();
+}
+
+Http::Response RenderedResource::show(const Http::Request& request, const Http::AcceptHeader& accept,
+                                      const RenderRequest& rendering, const ResourcePath& path)
+{
     PictureForm form;
     QVector<int> frames;
     std::shared_ptr<const ServedStudy> study;
     QVector<ListedImage> images;
-    Verdict verdict = RenderRequest::parse(request, rendering);
+    Verdict verdict = framesOf(path, frames);
     if (verdict.good())
-        verdict = PictureForm::choose(Http::AcceptHeader::of(request), form);
-    if (verdict.good())
-        verdict = framesOf(path, frames);
-    if (verdict.good())
-        verdict = findStudy(mStudies, path, study);
+        verdict = findStudy(*mStudies, path, study);
     if (verdict.good())
         verdict = listImages(*study, path, images);
+    if (verdict.bad())
+        return verdict.response();
+    if (!path.instance.isEmpty() && frames.isEmpty()) {
+        std::optional<Http::Response> whole = showWhole(request, accept, *study, images.first(), *mObjects);
+        if (whole)
+            return std::move(*whole);
+    }
+    verdict = PictureForm::choose(accept, form);
     if (verdict.bad())
         return verdict.response();
 
@@ -163,10 +197,8 @@ Http::Response RenderedResource::answer(const Http::Request& request, const Reso
         return Http::failure(406, QStringLiteral("Several pictures are given as multipart/related only"));
     const QByteArray key =
         path.instance.isEmpty() ? representativeOf(*study, path, images) : images.first().key;
-    QByteArray bytes;
-    verdict =
-        drawn(*study, {key, frames.value(0, FrameView::kRepresentative)}, rendering, form.mediaType, bytes);
-    return verdict.good() ? Http::textResponse(200, form.mediaType, bytes) : verdict.response();
+    return one(request, *study, {key, frames.value(0, FrameView::kRepresentative)}, rendering, form.mediaType,
+               *mObjects);
 }
 
 }  // namespace Kdd::DicomWeb

@@ -7,9 +7,11 @@
 #include <QList>
 
 #include <dcmtk/dcmdata/dctk.h>
+#include <kddlib/KxCurlClient.h>
 #include <kddlib/KxDcmFileLoader.h>
 #include <kddlib/KxVolumeInfo.h>
 #include <kddlib/LogFile.h>
+#include <kddlib/PathName.h>
 #include <kddlib/PreviewGenerator.h>
 #include <kddlib/TagMap.h>
 
@@ -69,13 +71,16 @@ Verdict ShownImage::open(const ServedStudy& study, const QByteArray& key)
     const Verdict known = takeImage(study, key, origin, &shown);
     if (known.bad())
         return known;
-    mPath = QFile::decodeName(origin.path);
+    mPath = pathText(origin.path);
+    Result unopened;  // the loader tells the reason, too
+    mState = Http::OpenFile::open(origin.path, unopened);
     mFile = std::make_unique<KxDcmFileLoader>(KxDcmFileLoader::Mode::BoundedLocal);
     const OFCondition condition =
         mFile->loadFile(OFFilename(origin.path.constData()), EXS_Unknown, EGL_noChange, kLongestInMemory);
     if (condition.bad()) {
         LogFile::errorf("%s: %s", origin.path.constData(), condition.text());
-        return {QFile::exists(mPath) ? 500 : 410, QStringLiteral("The instance's DICOM file cannot be read")};
+        const bool isGone = !KxCurlClient::isUrl(origin.path.constData()) && !QFile::exists(mPath);
+        return {isGone ? 410 : 500, QStringLiteral("The instance's DICOM file cannot be read")};
     }
     if (!isSame(dataset(), origin)) {
         LogFile::errorf("%s holds another image than %s by now", origin.path.constData(), key.constData());
@@ -94,7 +99,25 @@ int ShownImage::frames() const
     return qMax<Sint32>(number, 1);
 }
 
+/// Long values are read by the file's name when they are asked for, which may be another file's by then.
+Verdict ShownImage::checkUnchanged() const
+{
+    Result result;
+    const auto now = Http::OpenFile::open(pathBytes(mPath), result);
+    if (mState != nullptr && now != nullptr && now->identity() == mState->identity())
+        return {};
+    LogFile::errorf("%s was changed while it was read", qUtf8Printable(mPath));
+    return {503, QStringLiteral("The instance's DICOM file is being changed; ask again")};
+}
+
 Verdict ShownImage::draw(int frame, const RenderRequest& rendering, QImage& picture) const
+{
+    const Verdict drawn = drawAsRead(frame, rendering, picture);
+    const Verdict unchanged = checkUnchanged();
+    return unchanged.bad() ? unchanged : drawn;
+}
+
+Verdict ShownImage::drawAsRead(int frame, const RenderRequest& rendering, QImage& picture) const
 {
     if (frames() == 0)
         return {404, QStringLiteral("The instance has no pixels")};
@@ -104,8 +127,7 @@ Verdict ShownImage::draw(int frame, const RenderRequest& rendering, QImage& pict
     view.frame = frame;
     view.window = rendering.window;
     // A part of the picture may fill the viewport, so that it is needed as it is stored.
-    const bool isWhole = rendering.region.width == 0 && rendering.region.height == 0;
-    if (isWhole && !rendering.viewport.isEmpty()) {
+    if (rendering.region.isWhole() && !rendering.viewport.isEmpty()) {
         view.width = rendering.viewport.width();
         view.height = rendering.viewport.height();
     }

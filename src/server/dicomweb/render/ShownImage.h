@@ -2,6 +2,7 @@
 
 #include "server/dicomweb/StudyShelf.h"
 #include "server/dicomweb/render/RenderRequest.h"
+#include "server/http/OpenFile.h"
 
 #include <QImage>
 
@@ -33,12 +34,15 @@ public:
     int frames() const;
 
     /// The picture of a frame (0-based, or FrameView::kRepresentative), cut, turned and fitted as wanted. 404 without
-    /// such a frame; 406 when its pixels cannot be shown.
+    /// such a frame; 406 when its pixels cannot be shown; 503 when the file was changed meanwhile.
     Verdict draw(int frame, const RenderRequest& rendering, QImage& picture) const;
 
 private:
     DcmDataset& dataset() const;
+    Verdict checkUnchanged() const;
+    Verdict drawAsRead(int frame, const RenderRequest& rendering, QImage& picture) const;
 
+    std::shared_ptr<const Http::OpenFile> mState;
     std::unique_ptr<KxDcmFileLoader> mFile;
     QString mPath;
 };

@@ -1,9 +1,11 @@
 #include "server/dicomweb/render/ThumbnailResource.h"
 
 #include "server/dicomweb/render/PictureForm.h"
+#include "server/dicomweb/render/PictureTag.h"
 #include "server/dicomweb/render/RenderedResource.h"
 #include "server/dicomweb/render/ShownImage.h"
 #include "server/dicomweb/retrieve/ImageFinder.h"
+#include "server/http/EntityTag.h"
 
 #include <kddlib/TagMap.h>
 
@@ -83,7 +85,7 @@ Http::Response ThumbnailResource::answer(const Http::Request& request, const Res
     if (verdict.good() && Http::AcceptHeader::of(request).quality({kMediaType, ""}) == 0)
         verdict = {406, QStringLiteral("Thumbnails are given as image/jpeg")};
     if (verdict.good())
-        verdict = findStudy(mStudies, path, study);
+        verdict = findStudy(*mStudies, path, study);
     if (verdict.good())
         verdict = listImages(*study, path, images);
     if (verdict.bad())
@@ -101,13 +103,26 @@ Http::Response ThumbnailResource::answer(const Http::Request& request, const Res
                          request.parameter("viewport").count(',') < 2;
     QByteArray image = images.first().key;
     QByteArray bytes = previewOf(*study, path, image);
-    if (isPlain && !bytes.isEmpty())
-        bytes = reduced(bytes, rendering);
+    const PictureTag picture{image, "thumbnail " + QByteArray::number(frame) + '\n' + rendering.text()};
+    const bool isStored = isPlain && !bytes.isEmpty();
+    QByteArray tag;
+    if (isStored)
+        tag = picture.ofStored(*study);
     else
+        verdict = picture.ofDrawn(*study, *mObjects, tag);
+    if (verdict.good() && Http::hasEntity(request, tag))
+        return Http::notModified(tag);
+    if (isStored)
+        bytes = reduced(bytes, rendering);
+    else if (verdict.good())
         verdict = drawn(*study, image, frame, rendering, bytes);
     if (verdict.good() && bytes.isEmpty())
         verdict = {500, QStringLiteral("The picture cannot be written")};
-    return verdict.good() ? Http::textResponse(200, kMediaType, bytes) : verdict.response();
+    if (verdict.bad())
+        return verdict.response();
+    Http::Response response = Http::textResponse(200, kMediaType, bytes);
+    Http::addEntityTag(tag, response);
+    return response;
 }
 
 }  // namespace Kdd::DicomWeb

@@ -2,6 +2,7 @@
 
 #include "server/dicomweb/Resource.h"
 #include "server/dicomweb/StudyShelf.h"
+#include "server/dicomweb/retrieve/ObjectShelf.h"
 
 namespace Kdd::DicomWeb
 {
@@ -11,8 +12,9 @@ namespace Kdd::DicomWeb
 class ThumbnailResource : public Resource
 {
 public:
-    explicit ThumbnailResource(StudyShelf& studies)
-        : mStudies(studies)
+    ThumbnailResource(std::shared_ptr<StudyShelf> studies, std::shared_ptr<ObjectShelf> objects)
+        : mStudies(std::move(studies))
+        , mObjects(std::move(objects))
     {
     }
 
@@ -20,7 +22,8 @@ public:
     Http::Response answer(const Http::Request& request, const ResourcePath& path) override;
 
 private:
-    StudyShelf& mStudies;
+    std::shared_ptr<StudyShelf> mStudies;
+    std::shared_ptr<ObjectShelf> mObjects;
 };
 
 }  // namespace Kdd::DicomWeb

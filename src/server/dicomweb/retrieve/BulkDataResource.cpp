@@ -4,8 +4,8 @@
 #include "server/dicomweb/retrieve/EntriesProducer.h"
 #include "server/dicomweb/retrieve/PixelBody.h"
 #include "server/dicomweb/retrieve/PixelValue.h"
+#include "server/dicomweb/retrieve/ValueAnswer.h"
 #include "server/http/MultipartWriter.h"
-#include "server/http/RangeHeader.h"
 
 #include <numeric>
 
@@ -14,45 +14,6 @@ namespace Kdd::DicomWeb
 
 namespace
 {
-
-Http::Response notModified(const QByteArray& etag)
-{
-    Http::Response response(304);
-    response.addHeader("ETag", etag);
-    return response;
-}
-
-bool isKnown(const Http::Request& request, const QByteArray& etag)
-{
-    return !etag.isEmpty() && request.header("if-none-match").contains(etag);
-}
-
-/// The value alone, or what the request's Range wants of it.
-Http::Response alone(const Http::Request& request, const BulkValue& value, const QByteArray& contentType)
-{
-    if (isKnown(request, value.etag))
-        return notModified(value.etag);
-    const qint64 length = value.length();
-    const Http::WantedBytes wanted = Http::wantedBytes(request, length, value.etag);
-    const QByteArray size = QByteArray::number(length);
-    if (wanted.kind == Http::WantedBytes::Kind::Impossible) {
-        Http::Response refused = Http::failure(416, QStringLiteral("The value has %1 bytes").arg(length));
-        refused.addHeader("Content-Range", "bytes */" + size);
-        return refused;
-    }
-    Http::Response response;
-    response.addHeader("Content-Type", contentType);
-    response.addHeader("Accept-Ranges", "bytes");
-    if (!value.etag.isEmpty())
-        response.addHeader("ETag", value.etag);
-    if (wanted.kind == Http::WantedBytes::Kind::Part) {
-        response.status = 206;
-        response.addHeader("Content-Range", "bytes " + QByteArray::number(wanted.offset) + '-' +
-                                                QByteArray::number(wanted.offset + wanted.length - 1) + '/' + size);
-    }
-    value.append(wanted.offset, wanted.length, response.body);
-    return response;
-}
 
 /// The value as the only part.
 Http::Response asPart(const BulkValue& value, const QByteArray& mediaType, const QByteArray& contentType)
@@ -78,7 +39,8 @@ Http::Response answerValue(const Http::Request& request, const BulkValue& value)
         return Http::failure(406, QStringLiteral("The value can be given as ") +
                                       QString::fromLatin1(value.mediaType));
     const Http::MediaType& offer = offers.at(chosen);
-    return offer.parts.isEmpty() ? alone(request, value, offer.name) : asPart(value, offer.parts, offer.parts);
+    return offer.parts.isEmpty() ? alone(request, value, offer.name)
+                                 : asPart(value, offer.parts, offer.parts);
 }
 
 QVector<int> allFrames(const FrameIndex& index)
@@ -97,6 +59,7 @@ Http::Response answerPixels(const Http::Request& request, const FoundObject& obj
     if (!index.hasPixels())
         return Http::failure(404, QStringLiteral("The instance has no pixels"));
     PixelOffer offer = pixelOfferOf(index, isOneValue(index) ? 1 : index.frames());
+    offer.encodings.clear();  // values are given as they are, frames in other forms
     offer.prefersSingle = true;
     if (choosePixelForm(accept, offer, form)) {
         if (!isOneValue(index))
@@ -109,7 +72,7 @@ Http::Response answerPixels(const Http::Request& request, const FoundObject& obj
                                  : asPart(value, form.mediaType, form.contentType());
     }
     // All frames of a compressed image are one stretch of bytes only when they are decoded.
-    offer = PixelOffer{kExplicitLittleEndian, true, true, true};
+    offer = PixelOffer{kExplicitLittleEndian, true, true, true, {}};
     if (!index.canDecode() || !choosePixelForm(accept, offer, form))
         return noSuitablePixels(index).response();
     Http::Response response;
@@ -137,6 +100,7 @@ Verdict choosePart(const Http::AcceptHeader& accept, const FoundObject& object, 
     if (!object.index.hasPixels())
         return {404, QStringLiteral("No instance has pixels")};
     PixelOffer offer = pixelOfferOf(object.index, object.index.frames());
+    offer.encodings.clear();
     offer.canBeSingle = false;
     return choosePixelForm(accept, offer, form) ? Verdict() : noSuitablePixels(object.index);
 }
@@ -191,15 +155,17 @@ Http::Response BulkDataResource::answer(const Http::Request& request, const Reso
     QVector<ElementStep> steps;
     const bool isValue = !path.rest.isEmpty();
     if (isValue && !readSteps(path.rest, steps))
-        return Http::failure(400, QStringLiteral("Values are named by keys of eight hexadecimal digits, with the "
-                                                 "number of an item between those of a sequence and of its attribute"));
+        return Http::failure(
+            400, QStringLiteral("Values are named by keys of eight hexadecimal digits, with the "
+                                "number of an item between those of a sequence and of its attribute"));
     Verdict verdict = findStudy(*mStudies, path, study);
     if (verdict.good())
         verdict = listImages(*study, path, images);
     if (verdict.bad())
         return verdict.response();
 
-    const bool isPixels = isValue ? leadToPixels(steps) : path.resource == "pixeldata" && !path.instance.isEmpty();
+    const bool isPixels =
+        isValue ? leadToPixels(steps) : path.resource == "pixeldata" && !path.instance.isEmpty();
     if (isPixels) {
         ImageOrigin origin;
         FoundObject object;

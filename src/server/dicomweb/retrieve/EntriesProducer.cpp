@@ -5,13 +5,6 @@
 namespace Kdd::DicomWeb
 {
 
-namespace
-{
-
-constexpr qint64 kBlock = 256 * 1024;  // of what is read from files [bytes]
-
-}  // namespace
-
 Result EntriesProducer::next(QByteArray& block)
 {
     block.clear();
@@ -23,23 +16,20 @@ Result EntriesProducer::next(QByteArray& block)
 
 Result EntriesProducer::step(QByteArray& block)
 {
-    if (!mBody.empty()) {
-        bool isDone = false;
-        const Result taken = takeFrom(mBody.front(), block, isDone);
-        if (isDone)
-            mBody.pop_front();
+    if (mBody != nullptr) {
+        const Result taken = mBody->next(block);
         mPacking->pass(block);
+        if (taken.good() && block.isEmpty()) {
+            mBody.reset();
+            block = mPacking->end();
+        }
         return taken;
     }
-    if (mHasBegun) {
-        mHasBegun = false;
-        block = mPacking->end();
-    } else if (!mEntries.empty()) {
+    if (!mEntries.empty()) {
         Entry& entry = mEntries.front();
         block = mPacking->begin(entry.name, entry.mediaType);
-        mBody.assign(std::make_move_iterator(entry.body.begin()), std::make_move_iterator(entry.body.end()));
+        mBody = std::make_unique<BodyBlocks>(std::move(entry.body));
         mEntries.pop_front();
-        mHasBegun = true;
     } else if (mNextImage < mImages) {
         std::vector<Entry> entries;
         const Verdict made = mMake(mNextImage++, entries);
@@ -51,26 +41,6 @@ Result EntriesProducer::step(QByteArray& block)
         mIsFinished = true;
     }
     return {};
-}
-
-Result EntriesProducer::takeFrom(Http::BodyPart& part, QByteArray& block, bool& isDone)
-{
-    if (auto* bytes = std::get_if<QByteArray>(&part)) {
-        block = *bytes;
-        isDone = true;
-        return {};
-    }
-    if (auto* range = std::get_if<Http::FileRange>(&part)) {
-        const qint64 count = qMin(kBlock, range->length);
-        const Result read = range->file->read(range->offset, count, block);
-        range->offset += count;
-        range->length -= count;
-        isDone = range->length == 0;
-        return read;
-    }
-    const Result produced = std::get<std::unique_ptr<Http::Producer>>(part)->next(block);
-    isDone = block.isEmpty();
-    return produced;
 }
 
 }  // namespace Kdd::DicomWeb

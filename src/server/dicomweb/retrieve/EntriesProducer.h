@@ -1,5 +1,6 @@
 #pragma once
 
+#include "server/dicomweb/retrieve/BodyBlocks.h"
 #include "server/dicomweb/retrieve/Verdict.h"
 #include "server/http/Packing.h"
 
@@ -38,15 +39,13 @@ public:
 
 private:
     Result step(QByteArray& block);
-    Result takeFrom(Http::BodyPart& part, QByteArray& block, bool& isDone);
 
     int mImages;
     Maker mMake;
     std::unique_ptr<Http::Packing> mPacking;
     int mNextImage = 0;
-    std::deque<Entry> mEntries;  // of the present image, the first half sent perhaps
-    std::deque<Http::BodyPart> mBody;  // what is left of the entry that has begun
-    bool mHasBegun = false;
+    std::deque<Entry> mEntries;         // of the present image, the first half sent perhaps
+    std::unique_ptr<BodyBlocks> mBody;  // of the entry that has begun
     bool mIsFinished = false;
 };
 

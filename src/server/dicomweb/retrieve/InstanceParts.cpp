@@ -1,10 +1,16 @@
 #include "server/dicomweb/retrieve/InstanceParts.h"
 
+#include "server/dicomweb/retrieve/BodyBlocks.h"
 #include "server/dicomweb/retrieve/PixelValue.h"
+
+#include <QByteArrayList>
 
 #include <kddlib/KxCurlClient.h>
 #include <kddlib/LogFile.h>
 #include <kddlib/TagMap.h>
+
+#include <algorithm>
+#include <iterator>
 
 namespace Kdd::DicomWeb
 {
@@ -12,16 +18,25 @@ namespace Kdd::DicomWeb
 namespace
 {
 
+/// What an object can be given in beside the syntax it is stored in.
+QVector<QByteArray> othersOf(const FrameIndex& index)
+{
+    if (!index.canDecode())
+        return {};
+    return QVector<QByteArray>{kExplicitLittleEndian, kImplicitLittleEndian, kDeflatedLittleEndian} +
+           index.encodings();
+}
+
 Verdict chooseSyntax(const FoundObject& object, const InstanceForm& form, QByteArray& syntaxUID)
 {
-    syntaxUID = form.syntaxFor(object.index.transferSyntaxUID(), object.index.canDecode());
+    const QVector<QByteArray> others = othersOf(object.index);
+    syntaxUID = form.syntaxFor(object.index.transferSyntaxUID(), others);
     if (!syntaxUID.isEmpty())
         return {};
-    const QString others = object.index.canDecode()
-                               ? QStringLiteral(" and in the syntaxes without compression in little endian")
-                               : QStringLiteral("; there is no decoder for it");
-    return {406, QStringLiteral("The instance can be given in the transfer syntax %1%2")
-                     .arg(QString::fromLatin1(object.index.transferSyntaxUID()), others)};
+    const QByteArray known = others.isEmpty() ? QByteArray("; there is no decoder for it")
+                                              : " and in " + others.toList().join(", ");
+    return {406, QStringLiteral("The instance can be given in the transfer syntax ") +
+                     QString::fromLatin1(object.index.transferSyntaxUID() + known)};
 }
 
 Verdict failed(const ListedImage& image, const Result& result)
@@ -31,19 +46,23 @@ Verdict failed(const ListedImage& image, const Result& result)
 }
 
 Verdict appendPixels(const ListedImage& image, const FoundObject& object, CorrectedDataset::Pixels pixels,
-                     std::vector<Http::BodyPart>& body)
+                     const QByteArray& syntaxUID, std::vector<Http::BodyPart>& body)
 {
     using Pixels = CorrectedDataset::Pixels;
     if (pixels == Pixels::Stored && object.index.pixelValue().length > 0)
         body.push_back(object.bytes->part(object.index.pixelValue()));
-    if (pixels != Pixels::Decoded)
+    std::unique_ptr<Http::Producer> producer;
+    if (pixels == Pixels::Decoded)
+        producer = std::make_unique<DecodedProducer>(object);
+    if (pixels == Pixels::Encoded)
+        producer = std::make_unique<EncodedProducer>(object, syntaxUID);
+    if (producer == nullptr)
         return {};
-    auto producer = std::make_unique<DecodedProducer>(object);
     QByteArray first;
     // The first frame at once, so that what cannot be decoded gets its status.
-    const Result decoded = producer->next(first);
-    if (decoded.bad())
-        return failed(image, decoded);
+    const Result made = producer->next(first);
+    if (made.bad())
+        return failed(image, made);
     body.emplace_back(first);
     body.emplace_back(std::move(producer));
     return {};
@@ -85,10 +104,16 @@ Verdict makeInstance(const ServedStudy& study, const ListedImage& image, const I
         body.push_back(object.bytes->part({0, object.bytes->size()}));
         return {};
     }
-    body.emplace_back(dataset.head());
-    verdict = appendPixels(image, object, dataset.pixels(), body);
+    body.emplace_back(dataset.head().left(dataset.metaLength()));
+    std::vector<Http::BodyPart> rest;
+    rest.emplace_back(dataset.head().mid(dataset.metaLength()));
+    verdict = appendPixels(image, object, dataset.pixels(), syntaxUID, rest);
     if (!dataset.tail().isEmpty())
-        body.emplace_back(dataset.tail());
+        rest.emplace_back(dataset.tail());
+    if (syntaxUID == kDeflatedLittleEndian)
+        body.emplace_back(std::make_unique<DeflatedBody>(std::move(rest)));
+    else
+        std::move(rest.begin(), rest.end(), std::back_inserter(body));
     return verdict;
 }
 

@@ -42,7 +42,8 @@ Verdict ObjectShelf::open(const ImageOrigin& origin, FoundObject& found)
     }
     if (!origin.isIn(opened.index)) {
         LogFile::errorf("%s cannot be served: it holds image %s of study %s", origin.path.constData(),
-                        opened.index.sopInstanceUID().constData(), opened.index.studyInstanceUID().constData());
+                        opened.index.sopInstanceUID().constData(),
+                        opened.index.studyInstanceUID().constData());
         return {410, QStringLiteral("The image's DICOM file holds another image by now")};
     }
     found = std::move(opened);
@@ -57,11 +58,12 @@ Result ObjectShelf::find(const QByteArray& path, FoundObject& found)
         return result;
     found.identity = found.bytes->identity();
     const QByteArray key = path + '\n' + found.identity;
+    const bool isRemembered = !found.identity.isEmpty() && found.bytes->isSettled();
     Remembered seen;
     bool isKnown = false;
     {
         const std::lock_guard<std::mutex> lock(mMutex);
-        const Remembered* const known = found.identity.isEmpty() ? nullptr : mSeen.object(key);
+        const Remembered* const known = isRemembered ? mSeen.object(key) : nullptr;
         isKnown = known != nullptr;
         if (isKnown)
             seen = *known;
@@ -71,7 +73,7 @@ Result ObjectShelf::find(const QByteArray& path, FoundObject& found)
         if (result.bad())
             return result;
         const std::lock_guard<std::mutex> lock(mMutex);
-        if (!found.identity.isEmpty())
+        if (isRemembered)
             mSeen.insert(key, new Remembered(seen),
                          static_cast<int>(key.size() + seen.index.cost() + seen.converted.size()));
     }

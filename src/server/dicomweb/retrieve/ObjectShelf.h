@@ -3,9 +3,9 @@
 #include "server/dicomweb/retrieve/StoredObject.h"
 #include "server/dicomweb/retrieve/Verdict.h"
 
-#include <kddlib/CorrectedDataset.h>
-
 #include <QCache>
+
+#include <kddlib/CorrectedDataset.h>
 
 #include <mutex>
 

@@ -7,6 +7,20 @@
 namespace Kdd::DicomWeb
 {
 
+namespace
+{
+
+Result readFrame(const FoundObject& object, int frame, const PixelForm& form, QByteArray& bytes)
+{
+    if (form.isStored)
+        return object.index.readStored(*object.bytes, frame, bytes);
+    if (form.transferSyntax == kExplicitLittleEndian)
+        return object.index.readDecoded(*object.bytes, frame, bytes);
+    return object.index.readEncoded(*object.bytes, frame, form.transferSyntax, bytes);
+}
+
+}  // namespace
+
 Verdict damagedFrame(int frame, const Result& result)
 {
     LogFile::errorf("Frame %d cannot be served: %s", frame + 1, qUtf8Printable(result.text()));
@@ -20,6 +34,7 @@ PixelOffer pixelOfferOf(const FrameIndex& index, int frames)
     offer.transferSyntax = index.isEncapsulated() ? index.transferSyntaxUID() : kExplicitLittleEndian;
     offer.canDecode = index.canDecode();
     offer.canBeSingle = frames == 1;
+    offer.encodings = index.encodings();
     return offer;
 }
 
@@ -27,12 +42,16 @@ Verdict noSuitablePixels(const FrameIndex& index)
 {
     const QString syntax = QString::fromLatin1(index.transferSyntaxUID());
     const QString type = QString::fromLatin1(mediaTypeOf(index.transferSyntaxUID()));
-    const QString decoded = index.canDecode() ? QStringLiteral(" or decoded as application/octet-stream")
-                                              : QStringLiteral("; there is no decoder for them");
-    return {406, QStringLiteral("The pixels can be given as %1; transfer-syntax=%2%3").arg(type, syntax, decoded)};
+    QString decoded = index.canDecode() ? QStringLiteral(" or decoded as application/octet-stream")
+                                        : QStringLiteral("; there is no decoder for them");
+    for (const QByteArray& uid : index.encodings())
+        decoded += QLatin1String(", ") + QString::fromLatin1(mediaTypeOf(uid) + "; transfer-syntax=" + uid);
+    return {406,
+            QStringLiteral("The pixels can be given as %1; transfer-syntax=%2%3").arg(type, syntax, decoded)};
 }
 
-Verdict appendFrame(const FoundObject& object, int frame, const PixelForm& form, std::vector<Http::BodyPart>& body)
+Verdict appendFrame(const FoundObject& object, int frame, const PixelForm& form,
+                    std::vector<Http::BodyPart>& body)
 {
     QVector<FileStretch> stretches;
     const bool isInPlace = form.isStored && object.index.locate(frame, stretches).good();
@@ -41,8 +60,7 @@ Verdict appendFrame(const FoundObject& object, int frame, const PixelForm& form,
         return {};
     }
     QByteArray bytes;
-    const Result read = form.isStored ? object.index.readStored(*object.bytes, frame, bytes)
-                                      : object.index.readDecoded(*object.bytes, frame, bytes);
+    const Result read = readFrame(object, frame, form, bytes);
     if (read.bad())
         return damagedFrame(frame, read);
     body.emplace_back(bytes);
@@ -79,11 +97,11 @@ Result FramesProducer::next(QByteArray& block)
     if (mNext < mFrames.size()) {
         QByteArray frame;
         const int number = mFrames.at(mNext++);
-        const Result read = mForm.isStored ? mObject.index.readStored(*mObject.bytes, number, frame)
-                                           : mObject.index.readDecoded(*mObject.bytes, number, frame);
+        const Result read = readFrame(mObject, number, mForm, frame);
         if (read.bad())
             return read.within(QStringLiteral("Frame %1").arg(number + 1));
-        block = mPacking == nullptr ? frame : mPacking->begin({}, mForm.contentType()) + frame + mPacking->end();
+        block =
+            mPacking == nullptr ? frame : mPacking->begin({}, mForm.contentType()) + frame + mPacking->end();
     }
     if (mNext == mFrames.size() && mPacking != nullptr) {
         block += mPacking->finish();

@@ -34,4 +34,21 @@ private:
     DecodedPixels mPixels;
 };
 
+/// Encodes them as they are sent, as a dataset in another syntax with compression would hold them.
+class EncodedProducer : public Http::Producer
+{
+public:
+    EncodedProducer(const FoundObject& object, const QByteArray& syntaxUID)
+        : mBytes(object.bytes)
+        , mPixels(*mBytes, object.index, syntaxUID)
+    {
+    }
+
+    Result next(QByteArray& block) override { return mPixels.next(block); }
+
+private:
+    std::shared_ptr<StoredObject> mBytes;
+    EncodedPixels mPixels;
+};
+
 }  // namespace Kdd::DicomWeb

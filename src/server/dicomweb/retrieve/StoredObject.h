@@ -17,6 +17,9 @@ public:
     /// Which file it is, in which state.
     virtual QByteArray identity() const = 0;
 
+    /// Whether the identity is that of no other state of the file; not so while it may still be written.
+    virtual bool isSettled() const { return true; }
+
     /// A stretch of it to be sent.
     virtual Http::BodyPart part(const FileStretch& stretch) const = 0;
 
@@ -36,6 +39,7 @@ public:
     qint64 size() const override { return mFile->size(); }
     qint64 read(qint64 offset, char* out, qint64 length) override;
     QByteArray identity() const override { return mFile->identity(); }
+    bool isSettled() const override { return mFile->isSettled(); }
     Http::BodyPart part(const FileStretch& stretch) const override;
 
 private:

@@ -1,0 +1,313 @@
+#!/usr/bin/env python3
+"""How kdd serve stands beside Orthanc with its DICOMweb plugin: the same requests to both, in turn, over loopback.
+
+    bench/dicomweb.py BUILD-FOLDER [SECONDS-PER-MEASUREMENT]
+
+The archive is a CT of 1,000 images of 512 x 512, one of its series with 499, and 50 small studies of kdd sample. Both
+servers stand on SQLite as it comes. Wall time and processor time are those of one request after the other over one
+connection; requests/s are those of one and of four connections. Processor time is the server's alone.
+"""
+import gzip
+import http.client
+import json
+import os
+import re
+import shutil
+import signal
+import socket
+import statistics
+import struct
+import subprocess
+import sys
+import tempfile
+import time
+
+STUDY = "1.2.826.0.1.3680043.2.1143.1"
+SERIES = (STUDY + ".1", STUDY + ".2")
+IMAGES = 1000
+SIDE = 512  # rows and columns
+TICKS = os.sysconf("SC_CLK_TCK")
+PLUGIN = "/usr/share/orthanc/plugins/libOrthancDicomWeb.so"
+LIST = "/studies?limit=101&offset=0&fuzzymatching=true&includefield=00081030%2C00080060%2C00080090%2C00100030"
+JSON = "application/dicom+json"
+FRAME = 'multipart/related; type="application/octet-stream"; transfer-syntax="*"'
+OBJECT = 'multipart/related; type="application/dicom"; transfer-syntax="*"'
+
+
+def elements(data):
+    """Start of the value, its length and its bytes' place in front, for each attribute of the outermost level."""
+    at = 132
+    while at < len(data):
+        group, number = struct.unpack_from("<HH", data, at)
+        if data[at + 4:at + 6] in (b"OB", b"OW", b"SQ", b"UN", b"UT", b"UC", b"UR", b"OF", b"OD", b"OL"):
+            length, value = struct.unpack_from("<I", data, at + 8)[0], at + 12
+        else:
+            length, value = struct.unpack_from("<H", data, at + 6)[0], at + 8
+        if length == 0xFFFFFFFF:  # a sequence of unknown length ends where its outermost delimiter stands
+            depth, end = 0, value
+            while True:
+                tag, size = data[end:end + 4], struct.unpack_from("<I", data, end + 4)[0]
+                if tag == b"\xfe\xff\xdd\xe0":
+                    break
+                end += 8 if size == 0xFFFFFFFF else 8 + size
+                if tag == b"\xfe\xff\x00\xe0" and size == 0xFFFFFFFF:
+                    end = data.index(b"\xfe\xff\x0d\xe0", end) + 8
+            length = end + 8 - value
+        yield (group << 16) | number, at, value, length
+        at = value + length
+
+
+def changed(data, values):
+    """The file with other values of some attributes, and without the length of its meta header, which nobody needs."""
+    out, done = bytearray(data[:132]), 132
+    for tag, at, value, length in elements(data):
+        out += data[done:at]
+        done = at
+        if tag == 0x00020000:
+            done = value + length
+        elif tag in values:
+            new = values[tag]
+            new += (b"\0" if data[at + 4:at + 6] in (b"UI", b"OW") else b" ") * (len(new) % 2)
+            size = struct.pack("<I" if value - at == 12 else "<H", len(new))
+            out += data[at:value - len(size)] + size + new
+            done = value + length
+    return bytes(out + data[done:])
+
+
+def make_archive(kdd, folder):
+    """Files of both servers; what is in them does not matter, but what they are like does."""
+    day = os.path.join(folder, "day")
+    subprocess.run([kdd, "--quiet", "sample", day, "--images", "200"], check=True)
+    slices = []
+    for place, _, names in sorted(os.walk(os.path.join(day, "CT-1"))):
+        if len(names) > 20:
+            slices = [open(os.path.join(place, name), "rb").read() for name in sorted(names) if name.endswith(".dcm")]
+            break
+    files = os.path.join(folder, "files")
+    os.mkdir(files)
+    # Noise that compresses as badly as that of a detector.
+    pixels = bytearray(os.urandom(SIDE * SIDE * 2))
+    pixels[1::2] = bytes(byte & 15 for byte in pixels[1::2])
+    for number in range(IMAGES):
+        series = 0 if number < 499 else 1
+        uid = "%s.%d" % (SERIES[series], number + 1)
+        pixels[0:2] = struct.pack("<H", number)
+        data = changed(slices[number % len(slices)], {
+            0x00020003: uid.encode(), 0x00080018: uid.encode(),
+            0x0020000D: STUDY.encode(), 0x0020000E: SERIES[series].encode(),
+            0x00200013: str(number + 1).encode(), 0x00200011: str(series + 1).encode(),
+            0x00200032: b"-200\\-220\\%.2f" % (64.5 - number * 1.5), 0x00201041: b"%.2f" % (64.5 - number * 1.5),
+            0x00280010: struct.pack("<H", SIDE), 0x00280011: struct.pack("<H", SIDE), 0x7FE00010: bytes(pixels)})
+        with open(os.path.join(files, "%04d.dcm" % number), "wb") as file:
+            file.write(data)
+    shutil.rmtree(day)
+    studies = 0
+    for seed in range(1, 9):
+        subprocess.run([kdd, "--quiet", "sample", day, "--images", "23", "--seed", str(seed)], check=True)
+        for name in sorted(os.listdir(day)):
+            if studies < 50 and re.match(r"[A-Z]+-\d+$", name):
+                shutil.move(os.path.join(day, name), os.path.join(files, "%d-%s" % (seed, name)))
+                studies += 1
+        shutil.rmtree(day)
+    return files
+
+
+def free_port():
+    with socket.socket() as probe:
+        probe.bind(("127.0.0.1", 0))
+        return probe.getsockname()[1]
+
+
+class Server:
+    """A process that answers DICOMweb at a port of this machine until it is stopped."""
+
+    def __init__(self, name, command, port, prefix="/dicom-web", env=None):
+        self.name, self.port, self.prefix = name, port, prefix
+        self.process = subprocess.Popen(command, env={**os.environ, **(env or {})},
+                                        stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL)
+        for _ in range(300):
+            try:
+                socket.create_connection(("127.0.0.1", port), 1).close()
+                return
+            except OSError:
+                if self.process.poll() is not None:
+                    break
+                time.sleep(0.1)
+        self.stop()
+        sys.exit(name + " does not start")
+
+    def stop(self):
+        self.process.send_signal(signal.SIGTERM)
+        self.process.wait()
+
+    def cpu(self):
+        """Processor time so far [s]."""
+        with open("/proc/%d/stat" % self.process.pid) as file:
+            fields = file.read().rpartition(")")[2].split()
+        return (int(fields[11]) + int(fields[12])) / TICKS
+
+    def memory(self):
+        with open("/proc/%d/status" % self.process.pid) as file:
+            return int(re.search(r"VmHWM:\s+(\d+)", file.read()).group(1)) / 1024
+
+
+def start_kdd(kdd, folder, files, kept):
+    env = {"KDD_STORE": os.path.join(folder, "store"), "KDD_ANSWERS_SIZE": "1024" if kept else "0"}
+    if files:
+        subprocess.run([kdd, "--quiet", "add", files], check=True, env={**os.environ, **env})
+    port = free_port()
+    return Server("kdd" if kept else "kdd, nothing kept", [kdd, "serve", "--listen", "127.0.0.1:%d" % port], port,
+                  env=env)
+
+
+def start_peer(folder, files):
+    missing = [part for part in ("Orthanc", PLUGIN) if not (shutil.which(part) or os.path.exists(part))]
+    if missing:
+        print("No comparison: %s is missing (apt-get install orthanc orthanc-dicomweb)\n" % " and ".join(missing))
+        return None
+    port = free_port()
+    config = os.path.join(folder, "peer.json")
+    with open(config, "w") as file:
+        json.dump({"StorageDirectory": os.path.join(folder, "peer"), "IndexDirectory": os.path.join(folder, "peer"),
+                   "HttpPort": port, "DicomServerEnabled": False, "RemoteAccessAllowed": False, "Plugins": [PLUGIN]},
+                  file)
+    peer = Server("Orthanc", ["Orthanc", config], port)
+    link = http.client.HTTPConnection("127.0.0.1", port)
+    for place, _, names in os.walk(files):
+        for name in names:
+            with open(os.path.join(place, name), "rb") as file:
+                link.request("POST", "/instances", file.read())
+            answer = link.getresponse()
+            answer.read()
+            if answer.status not in (200, 400):  # a volume file is no instance
+                sys.exit("Orthanc takes no file: %d" % answer.status)
+    return peer
+
+
+def ask(link, server, path, headers):
+    link.request("GET", server.prefix + path, headers=headers)
+    answer = link.getresponse()
+    body = answer.read()
+    if answer.status != 200:
+        raise RuntimeError("%s answers %s with %d" % (server.name, path, answer.status))
+    return body, answer
+
+
+def check(server, row, link):
+    """That the answer is one: how many bytes it has."""
+    body, answer = ask(link, server, row["path"], row["headers"])
+    plain = gzip.decompress(body) if answer.getheader("Content-Encoding") == "gzip" else body
+    if row["holds"] is bytes and len(plain) < row["count"]:
+        raise RuntimeError("%s: %s has %d bytes only" % (server.name, row["name"], len(plain)))
+    if row["holds"] is list and len(json.loads(plain)) != row["count"]:
+        raise RuntimeError("%s: %s has %d objects" % (server.name, row["name"], len(json.loads(plain))))
+    return len(body)
+
+
+def one_by_one(server, row, seconds):
+    link = http.client.HTTPConnection("127.0.0.1", server.port)
+    size = check(server, row, link)
+    times, cpu, begin = [], server.cpu(), time.monotonic()
+    while len(times) < 3 or time.monotonic() - begin < seconds:
+        start = time.monotonic()
+        ask(link, server, row["path"], row["headers"])
+        times.append(time.monotonic() - start)
+    return size, statistics.median(times), (server.cpu() - cpu) / len(times)
+
+
+def rate(server, row, connections, seconds):
+    """Requests per second and processor time of each."""
+    command = ["wrk", "-t1", "-c%d" % connections, "-d%ds" % max(1, round(seconds)), "--timeout", "120s"]
+    for name, value in row["headers"].items():
+        command += ["-H", "%s: %s" % (name, value)]
+    before = server.cpu()
+    text = subprocess.run(command + ["http://127.0.0.1:%d%s%s" % (server.port, server.prefix, row["path"])],
+                          capture_output=True, text=True, check=True).stdout
+    if "Non-2xx" in text or "Socket errors" in text:
+        raise RuntimeError("%s: %s: %s" % (server.name, row["name"], text))
+    count = int(re.search(r"(\d+) requests in", text).group(1))
+    return (float(re.search(r"Requests/sec:\s+([\d.]+)", text).group(1)),
+            (server.cpu() - before) / count if count else float("inf"))
+
+
+def rows():
+    series = "/studies/%s/series/%s" % (STUDY, SERIES[0])
+    instance = series + "/instances/%s.7" % SERIES[0]
+    row = lambda name, path, count=1, accept=JSON, packed=False, holds=list, kept=True: {
+        "name": name, "path": path, "count": count, "holds": holds, "kept": kept,
+        "headers": {"Accept": accept, "Accept-Encoding": "gzip" if packed else "identity"}}
+    return [
+        row("list of 51 studies", LIST, 51),
+        row("one study by UID", LIST + "&StudyInstanceUID=" + STUDY),
+        row("series of a study", "/studies/%s/series?includefield=0008103E%%2C00080021" % STUDY, 2),
+        row("instances of a series, 499", series + "/instances", 499),
+        row("series metadata, 499, plain", series + "/metadata", 499),
+        row("series metadata, 499, gzip, not kept", series + "/metadata", 499, packed=True, kept=False),
+        row("series metadata, 499, gzip", series + "/metadata", 499, packed=True),
+        row("study metadata, 1,000, plain", "/studies/%s/metadata" % STUDY, 1000),
+        row("study metadata, 1,000, gzip, not kept", "/studies/%s/metadata" % STUDY, 1000, packed=True, kept=False),
+        row("study metadata, 1,000, gzip", "/studies/%s/metadata" % STUDY, 1000, packed=True),
+        row("instance metadata", instance + "/metadata"),
+        row("frame, 512 KB", instance + "/frames/1", SIDE * SIDE * 2, FRAME, holds=bytes),
+        row("instance as Part 10", instance, SIDE * SIDE * 2, OBJECT, holds=bytes),
+        row("rendered, JPEG", instance + "/rendered", 1000, "image/jpeg", holds=bytes),
+    ]
+
+
+def measure(server, row, seconds):
+    size, wall, cpu = one_by_one(server, row, seconds)
+    rates = []
+    if shutil.which("wrk"):
+        for connections in (1, 4):
+            found, spent = rate(server, row, connections, max(seconds, 3 * connections * wall))
+            rates.append(found)
+            # Of many short requests the clock's ticks tell more.
+            if connections == 1 and wall < 0.02:
+                cpu = spent
+    return {"bytes": size, "wall": wall * 1000, "cpu": cpu * 1000, "rates": rates}
+
+
+def main():
+    if len(sys.argv) < 2:
+        sys.exit(__doc__)
+    kdd = os.path.abspath(os.path.join(sys.argv[1], "src/tools/kdd/kdd"))
+    seconds = float(sys.argv[2]) if len(sys.argv) > 2 else 3
+    folder = tempfile.mkdtemp(prefix="kdd-dicomweb-")
+    servers = []
+    try:
+        files = make_archive(kdd, folder)
+        kept = start_kdd(kdd, folder, files, True)
+        servers.append(kept)
+        unkept = start_kdd(kdd, folder, None, False)
+        servers.append(unkept)
+        peer = start_peer(folder, files)
+        if peer:
+            servers.append(peer)
+        if not shutil.which("wrk"):
+            print("No requests/s: wrk is missing (apt-get install wrk)\n")
+        head = "| request | server | bytes | median ms | CPU ms | /s, 1 connection | /s, 4 | CPU ratio | /s ratio, 4 |"
+        print(head + "\n|" + "---|" * head.count(" | ") + "---|")
+        for row in rows():
+            results = []
+            for server in (kept if row["kept"] else unkept, peer):
+                if server is None:
+                    continue
+                found = measure(server, row, seconds)
+                results.append(found)
+                ratios = ["", ""]
+                if len(results) == 2:
+                    ratios[0] = "%.0f" % (found["cpu"] / results[0]["cpu"])
+                    if found["rates"]:
+                        ratios[1] = "%.1f" % (results[0]["rates"][1] / found["rates"][1] if found["rates"][1] else 0)
+                rates = ["%.1f" % each for each in found["rates"]] or ["", ""]
+                print("| %s | %s | %d | %.2f | %.3f | %s |" % (row["name"], server.name, found["bytes"], found["wall"],
+                                                               found["cpu"], " | ".join(rates + ratios)), flush=True)
+        print("\nLargest memory, MiB: " + ", ".join("%s %.0f" % (each.name, each.memory()) for each in servers))
+    finally:
+        for server in servers:
+            server.stop()
+        shutil.rmtree(folder)
+
+
+if __name__ == "__main__":
+    main()

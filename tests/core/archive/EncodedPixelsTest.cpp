@@ -1,0 +1,276 @@
+#include "core/archive/WholeDataset.h"
+#include "kddlib/Limits.h"
+#include "kddlib/items/RegularFile.h"
+#include "kddlib/net/dicom/DicomFileReader.h"
+#include "kddlib/tagmodel/TagMap.h"
+#include "support/DatasetBuilder.h"
+#include "support/RealFiles.h"
+
+#include <QTemporaryDir>
+
+#include <dcmtk/dcmdata/dcrledrg.h>
+#include <dcmtk/dcmdata/dctk.h>
+#include <dcmtk/dcmjpeg/djdecode.h>
+#include <dcmtk/dcmjpls/djdecode.h>
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <iterator>
+#include <map>
+#include <memory>
+#include <random>
+
+using namespace Kdd;
+
+namespace
+{
+
+constexpr const char* kRle = "1.2.840.10008.1.2.5";
+constexpr const char* kJpeg = "1.2.840.10008.1.2.4.70";
+constexpr const char* kJpegLs = "1.2.840.10008.1.2.4.80";
+
+/// The whole file in that syntax; empty when it cannot be made.
+QByteArray fileIn(const QByteArray& syntax, ByteSource& source, const FrameIndex& index)
+{
+    DcmFileFormat file;
+    CorrectedDataset dataset;
+    if (readDicomBuffer(source.bytes(), file).bad())
+        return {};
+    const std::unique_ptr<TagMap> image(TagMap::createTagMap(file.getDataset(), kDefaultValueBound));
+    if (dataset.make(source, index, *image, syntax).bad())
+        return {};
+    return wholeOf(dataset, source, index, syntax);
+}
+
+/// Before the library does it: who comes first decides whether colours are converted.
+const bool kRegistered = [] {
+    DJDecoderRegistration::registerCodecs(EDC_never);
+    DJLSDecoderRegistration::registerCodecs();
+    DcmRLEDecoderRegistration::registerCodecs();
+    return true;
+}();
+
+/// The pixels as DCMTK decodes them, colours left as they are; null where it cannot.
+QByteArray pixelsByDcmtk(const QByteArray& bytes, OFString& photometric)
+{
+    DcmFileFormat file;
+    DcmElement* pixels = nullptr;
+    if (!kRegistered || readDicomBuffer(bytes, file).bad() ||
+        file.getDataset()->chooseRepresentation(EXS_LittleEndianExplicit, nullptr).bad() ||
+        file.getDataset()->findAndGetElement(DCM_PixelData, pixels).bad())
+        return {};
+    file.getDataset()->findAndGetOFString(DCM_PhotometricInterpretation, photometric);
+    QByteArray decoded(static_cast<int>(pixels->getLength()), 0);
+    return pixels->getPartialValue(decoded.data(), 0, pixels->getLength()).good() ? decoded : QByteArray();
+}
+
+/// Of a picture made of noise.
+struct Kind
+{
+    const char* name;
+    const char* photometric;
+    int rows, columns, bitsAllocated, bitsStored;
+    bool isSigned, isPlanar;
+    std::vector<const char*> encodings;
+};
+
+std::ostream& operator<<(std::ostream& out, const Kind& kind)
+{
+    return out << kind.name;
+}
+
+const Kind kKinds[] = {
+    {"Bits", "MONOCHROME2", 5, 7, 1, 1, false, false, {kRle}},
+    {"Bytes", "MONOCHROME2", 5, 7, 8, 8, false, false, {kRle, kJpeg, kJpegLs}},
+    {"SignedBytes", "MONOCHROME1", 4, 4, 8, 8, true, false, {kRle, kJpeg, kJpegLs}},
+    {"OnePixel", "MONOCHROME2", 1, 1, 8, 8, false, false, {kRle, kJpeg, kJpegLs}},
+    {"TwelveBitsBesideOverlays", "MONOCHROME2", 6, 5, 16, 12, false, false, {kRle, kJpeg, kJpegLs}},
+    {"SignedTwelveBits", "MONOCHROME2", 6, 5, 16, 12, true, false, {kRle, kJpeg, kJpegLs}},
+    {"Words", "MONOCHROME2", 63, 65, 16, 16, false, false, {kRle, kJpeg, kJpegLs}},
+    {"SignedWords", "MONOCHROME2", 63, 65, 16, 16, true, false, {kRle, kJpeg, kJpegLs}},
+    {"LongWords", "MONOCHROME2", 3, 5, 32, 32, false, false, {kRle}},
+    {"Palette", "PALETTE COLOR", 9, 9, 8, 8, false, false, {kRle, kJpeg, kJpegLs}},
+    {"Rgb", "RGB", 5, 7, 8, 8, false, false, {kRle, kJpeg, kJpegLs}},
+    {"RgbByPlane", "RGB", 5, 7, 8, 8, false, true, {kRle, kJpeg, kJpegLs}},
+    {"RgbWords", "RGB", 5, 7, 16, 16, false, true, {kRle, kJpeg, kJpegLs}},
+    {"Ybr", "YBR_FULL", 5, 7, 8, 8, false, false, {kRle, kJpeg, kJpegLs}},
+    {"YbrByPlane", "YBR_FULL", 5, 7, 8, 8, false, true, {kRle, kJpeg, kJpegLs}},
+    {"YbrThatSharesChroma", "YBR_FULL_422", 5, 8, 8, 8, false, false, {kRle, kJpeg, kJpegLs}},
+    {"YbrPartial", "YBR_PARTIAL_422", 5, 8, 8, 8, false, false, {}},
+};
+
+class EncodedKinds : public testing::TestWithParam<Kind>
+{
+protected:
+    static constexpr int kFrames = 3;
+
+    int samples() const { return QByteArray(GetParam().photometric).size() == 3 || isYbr() ? 3 : 1; }
+    bool isYbr() const { return QByteArray(GetParam().photometric).startsWith("YBR"); }
+    bool sharesChroma() const { return QByteArray(GetParam().photometric).endsWith("_422"); }
+
+    /// Noise, some of it smooth, so that runs and large steps both occur.
+    QByteArray noise() const
+    {
+        const Kind& kind = GetParam();
+        const qint64 values = qint64(kind.rows) * kind.columns * (sharesChroma() ? 2 : samples());
+        QByteArray bytes(static_cast<int>((values * kFrames * kind.bitsAllocated + 7) / 8), 0);
+        std::mt19937 random(7);
+        for (int i = 0; i < bytes.size(); ++i)
+            bytes[i] = static_cast<char>(i % 50 < 20 ? 0x5a : random());
+        // Bits of a last byte that belong to no pixel.
+        if (kind.bitsAllocated == 1)
+            bytes[bytes.size() - 1] = 0x01;
+        return bytes;
+    }
+
+    ByteSource source(const QByteArray& pixels) const
+    {
+        const Kind& kind = GetParam();
+        DatasetBuilder image = aPicture(kind.rows, kind.columns, kind.bitsAllocated, kind.photometric);
+        image.with(DCM_BitsStored, QByteArray::number(kind.bitsStored).constData());
+        image.with(DCM_HighBit, QByteArray::number(kind.bitsStored - 1).constData());
+        image.with(DCM_PixelRepresentation, kind.isSigned ? "1" : "0").with(DCM_NumberOfFrames, "3");
+        image.with(DCM_SamplesPerPixel, samples() == 3 ? "3" : "1");
+        if (samples() == 3)
+            image.with(DCM_PlanarConfiguration, kind.isPlanar ? "1" : "0");
+        image.with(DCM_SOPClassUID, UID_SecondaryCaptureImageStorage).with(DCM_SOPInstanceUID, "1.2.3");
+        auto* element = new DcmPixelData(DcmTag(DCM_PixelData, kind.bitsAllocated > 8 ? EVR_OW : EVR_OB));
+        element->putUint8Array(reinterpret_cast<const Uint8*>(pixels.constData()),
+                               static_cast<Uint32>(pixels.size()));
+        DcmFileFormat file(&image.with(element).dataset());
+        const QByteArray path = mFolder.filePath(QStringLiteral("file.dcm")).toLocal8Bit();
+        EXPECT_TRUE(file.saveFile(path.constData(), EXS_LittleEndianExplicit).good());
+        return ByteSource::ofFile(QString::fromLocal8Bit(path));
+    }
+
+    /// What a decoder has to give: samples side by side, none of them shared.
+    QByteArray sideBySide(const QByteArray& pixels) const
+    {
+        const Kind& kind = GetParam();
+        const int width = kind.bitsAllocated / 8;
+        const int size = kind.rows * kind.columns;
+        QByteArray expected;
+        for (int i = 0; i < size * kFrames && sharesChroma(); ++i) {
+            expected += pixels.mid(i / 2 * 4 + i % 2, 1);
+            expected += pixels.mid(i / 2 * 4 + 2, 2);
+        }
+        for (int i = 0; i < size * kFrames && kind.isPlanar; ++i) {
+            for (int sample = 0; sample < 3; ++sample)
+                expected += pixels.mid(((i / size * 3 + sample) * size + i % size) * width, width);
+        }
+        return expected.isEmpty() ? pixels : expected;
+    }
+
+    QTemporaryDir mFolder;
+};
+
+TEST_P(EncodedKinds, HaveTheSamePixelsInEverySyntax)
+{
+    const QByteArray pixels = noise();
+    ByteSource stored = source(pixels);
+    FrameIndex index;
+    ASSERT_TRUE(index.read(stored).good());
+    QVector<QByteArray> wanted;
+    for (const char* uid : GetParam().encodings)
+        wanted.append(uid);
+    EXPECT_EQ(index.encodings(), wanted);
+    for (const QByteArray& uid : wanted) {
+        const QByteArray made = fileIn(uid, stored, index);
+        OFString photometric;
+        ByteSource again(made);
+        FrameIndex encoded;
+        ASSERT_TRUE(encoded.read(again).good()) << uid.constData();
+        EXPECT_EQ(encoded.transferSyntaxUID(), uid);
+        EXPECT_EQ(encoded.frames(), kFrames);
+        // DCMTK's RLE knows no single bits.
+        QByteArray decoded = GetParam().bitsAllocated == 1 ? allOf(DecodedPixels(again, encoded))
+                                                           : pixelsByDcmtk(made, photometric);
+        decoded.truncate(sideBySide(pixels).size());
+        EXPECT_EQ(decoded.toHex(), sideBySide(pixels).toHex()) << uid.constData();
+        const OFString meant = sharesChroma() ? "YBR_FULL" : GetParam().photometric;
+        EXPECT_TRUE(photometric == meant || GetParam().bitsAllocated == 1) << photometric;
+    }
+}
+
+/// Decoding here makes RGB of YBR, and leaves out what lies beside the value.
+std::vector<Kind> kindsThatStay()
+{
+    std::vector<Kind> kinds;
+    std::copy_if(std::begin(kKinds), std::end(kKinds), std::back_inserter(kinds), [](const Kind& kind) {
+        return !QByteArray(kind.photometric).startsWith("YBR") && kind.bitsStored == kind.bitsAllocated;
+    });
+    return kinds;
+}
+
+class RecodedKinds : public EncodedKinds
+{
+};
+
+TEST_P(RecodedKinds, GoFromOneCompressionIntoAnother)
+{
+    const QByteArray pixels = noise();
+    ByteSource stored = source(pixels);
+    FrameIndex index;
+    ASSERT_TRUE(index.read(stored).good());
+    for (const QByteArray& uid : index.encodings()) {
+        ByteSource again(fileIn(uid, stored, index));
+        FrameIndex encoded;
+        ASSERT_TRUE(encoded.read(again).good());
+        for (const QByteArray& other : encoded.encodings()) {
+            OFString photometric;
+            QByteArray decoded = pixelsByDcmtk(fileIn(other, again, encoded), photometric);
+            decoded.truncate(pixels.size());
+            EXPECT_EQ(decoded.toHex(), sideBySide(pixels).toHex())
+                << uid.constData() << " to " << other.constData();
+        }
+    }
+}
+
+INSTANTIATE_TEST_SUITE_P(All, EncodedKinds, testing::ValuesIn(kKinds),
+                         [](const auto& each) { return each.param.name; });
+
+INSTANTIATE_TEST_SUITE_P(All, RecodedKinds, testing::ValuesIn(kindsThatStay()),
+                         [](const auto& each) { return each.param.name; });
+
+TEST(EncodedPixels, OfRealFilesAreThoseThatDecodingGives)
+{
+    if (realFilesFolder().isEmpty())
+        GTEST_SKIP() << "KDD_TEST_DATA is not set";
+    std::map<QByteArray, int> made;
+    for (const QString& path :
+         realFiles("transfer-syntaxes") + realFiles("multiframe") + realFiles("modalities")) {
+        ByteSource source = ByteSource::ofFile(path);
+        QByteArray converted;
+        FrameIndex index;
+        if (index.read(source).bad() && readAsRegularFile(path.toLocal8Bit(), converted).good())
+            source = ByteSource(converted);
+        // Beside long ones, one whose frame is smaller than its image, and one that is no whole codestream.
+        if (index.read(source).bad() || index.frames() > 20 || source.size() > 400000 ||
+            path.endsWith(QLatin1String("multiframe/sc/multiframe.dcm")) ||
+            path.endsWith(QLatin1String("JPEG2000-embedded-sequence-delimiter.dcm")))
+            continue;
+        for (const QByteArray& syntax : index.encodings()) {
+            ByteSource again(fileIn(syntax, source, index));
+            FrameIndex encoded;
+            ASSERT_TRUE(encoded.read(again).good()) << qPrintable(path);
+            ASSERT_EQ(encoded.frames(), index.frames()) << qPrintable(path);
+            OFString photometric;
+            QByteArray whole = pixelsByDcmtk(again.bytes(), photometric);
+            QByteArray expected = pixelsByDcmtk(fileIn("1.2.840.10008.1.2.1", source, index), photometric);
+            DcmFileFormat native;
+            Uint16 planar = 0;
+            readDicomBuffer(source.bytes(), native);
+            native.getDataset()->findAndGetUint16(DCM_PlanarConfiguration, planar);
+            // What is laid out in another way is compared above.
+            if (whole.isNull() || planar == 1 || photometric.find("_422") != OFString_npos)
+                continue;
+            EXPECT_TRUE(whole == expected) << qPrintable(path) << ' ' << syntax.constData();
+            ++made[syntax];
+        }
+    }
+    EXPECT_GT(made[kRle], 50);
+    EXPECT_GT(made[kJpeg], 50);
+    EXPECT_GT(made[kJpegLs], 50);
+}
+
+}  // namespace

@@ -1,0 +1,156 @@
+#include "server/retrieve/RetrieveFixture.h"
+
+#include <QImage>
+#include <QList>
+
+using namespace Kdd;
+using namespace Kdd::DicomWeb;
+
+namespace
+{
+
+constexpr const char* kObject = "requestType=WADO&studyUID=1.2&seriesUID=1.2.3&objectUID=1.2.3.1&";
+
+class UriTest : public RetrieveTest
+{
+protected:
+    Http::Response ask(const QByteArray& parameters, const QByteArray& accept = "*/*")
+    {
+        Http::Request request;
+        request.headers = {{"accept", accept}};
+        for (const QByteArray& pair : parameters.split('&')) {
+            if (!pair.isEmpty())
+                request.query.append({pair.left(pair.indexOf('=')), pair.mid(pair.indexOf('=') + 1)});
+        }
+        return get("wado", request);
+    }
+
+    Http::Response object(const QByteArray& parameters, const QByteArray& accept = "*/*")
+    {
+        return ask(kObject + parameters, accept);
+    }
+
+    QImage picture(const QByteArray& parameters)
+    {
+        Http::Response response = object(parameters);
+        EXPECT_EQ(response.status, 200) << parameters.constData();
+        return QImage::fromData(bodyOf(response));
+    }
+};
+
+/// What is asked of an image with so many frames, by which Accept, and what is given; a number is a refusal.
+struct Form
+{
+    int frames;
+    const char* parameters;
+    const char* accept;
+    const char* given;
+};
+
+const Form kForms[] = {
+    {1, "", "*/*", "image/jpeg"},
+    {2, "", "*/*", "application/dicom; transfer-syntax=1.2.840.10008.1.2.1"},
+    {2, "frameNumber=2", "*/*", "image/jpeg"},
+    {2, "", "image/avif,image/webp,image/*,*/*;q=0.8", "image/jpeg"},
+    {1, "", "application/dicom", "application/dicom; transfer-syntax=1.2.840.10008.1.2.1"},
+    {1, "contentType=application/dicom", "image/jpeg",
+     "application/dicom; transfer-syntax=1.2.840.10008.1.2.1"},
+    {1, "contentType=image/png", "*/*", "image/png"},
+    {1, "contentType=image/gif,image/png;q=0.5,image/jpeg;q=0.4", "*/*", "image/png"},
+    {1, "contentType=image/gif", "*/*", "406"},
+    {1, "contentType=application/pdf", "*/*", "406"},
+    {1, "contentType=video/mp4", "*/*", "406"},
+    {1, "contentType=application/dicom&transferSyntax=1.2.840.10008.1.2.4.80", "*/*",
+     "application/dicom; transfer-syntax=1.2.840.10008.1.2.4.80"},
+    {1, "contentType=application/dicom&transferSyntax=1.2.840.10008.1.2.4.91", "*/*",
+     "application/dicom; transfer-syntax=1.2.840.10008.1.2.1"},
+    {1, "contentType=application/dicom&transferSyntax=x!", "*/*", "400"},
+    {1, "charset=UTF-8&contentType=image/jpeg", "*/*", "image/jpeg"},
+    {1, "anonymize=yes", "*/*", "400"},
+    {1, "anonymize=yes&contentType=application/dicom", "*/*", "400"},
+    {1, "annotation=patient", "*/*", "400"},
+    {1, "presentationUID=1.2&presentationSeriesUID=1.3", "*/*", "400"},
+    {2, "frameNumber=3&contentType=image/jpeg", "*/*", "404"},
+    {2, "frameNumber=0", "*/*", "400"},
+    {1, "rows=0", "*/*", "400"},
+    {1, "columns=9000", "*/*", "400"},
+    {1, "imageQuality=0", "*/*", "400"},
+    {1, "windowCenter=40", "*/*", "400"},
+    {1, "windowCenter=40&windowWidth=0.5", "*/*", "400"},
+    {1, "windowCenter=nan&windowWidth=10", "*/*", "400"},
+    {1, "region=0.5,0,0.4,1", "*/*", "400"},
+    {1, "region=0,0,1.1,1", "*/*", "400"},
+    {1, "region=0,0,1", "*/*", "400"},
+};
+
+TEST_F(UriTest, GivesTheFormThatIsAskedForOrTellsWhyNot)
+{
+    int frames = 0;
+    for (const Form& row : kForms) {
+        if (row.frames != frames)
+            add("a.dcm", anImageWithFrames(row.frames));
+        frames = row.frames;
+        Http::Response response = object(row.parameters, row.accept);
+        const QByteArray given =
+            response.status == 200 ? header(response, "Content-Type") : QByteArray::number(response.status);
+        EXPECT_EQ(given, row.given) << row.parameters << ' ' << row.accept;
+    }
+}
+
+TEST_F(UriTest, NeedsAllItsParameters)
+{
+    add("a.dcm", anImageWithFrames(1));
+    const QByteArray whole = kObject;
+    for (const char* name : {"requestType", "studyUID", "seriesUID", "objectUID"})
+        EXPECT_EQ(ask(QByteArray(whole).replace(name, "other")).status, 400) << name;
+    EXPECT_EQ(ask(QByteArray(whole).replace("WADO", "QIDO")).status, 400);
+    EXPECT_EQ(ask(QByteArray(whole).replace("studyUID=1.2", "studyUID=../1.2")).status, 400);
+    EXPECT_EQ(ask(QByteArray(whole).replace("studyUID=1.2", "studyUID=1.9")).status, 404);
+    EXPECT_EQ(ask(QByteArray(whole).replace("seriesUID=1.2.3", "seriesUID=1.2.4")).status, 404);
+}
+
+TEST_F(UriTest, DrawsAsThePathsDo)
+{
+    add("a.dcm", anImageWithFrames(2));
+    EXPECT_EQ(picture("contentType=image/png").size(), QSize(16, 16));
+    EXPECT_EQ(picture("contentType=image/png&rows=40").size(), QSize(40, 40));
+    EXPECT_EQ(picture("contentType=image/png&rows=40&columns=8").size(), QSize(8, 8));
+    EXPECT_EQ(picture("contentType=image/png&region=0.25,0.5,1,1").size(), QSize(12, 8));
+    const QImage cut = picture(
+        "contentType=image/png&frameNumber=1&region=0.5,0.25,1,0.75&windowCenter=2000&windowWidth=900");
+    const QImage whole = picture("contentType=image/png&frameNumber=1&windowCenter=2000&windowWidth=900");
+    EXPECT_EQ(cut, whole.copy(8, 4, 8, 8));
+    Http::Request request;
+    request.headers = {{"accept", "image/png"}};
+    request.query = {{"window", "2000,900,linear"}};
+    Http::Response path = get(QByteArray(kInstance) + "/frames/1/rendered", request);
+    EXPECT_EQ(QImage::fromData(bodyOf(path)), whole);
+}
+
+TEST_F(UriTest, GivesCorrectionsAndMovedImagesUnderTheirNewStudyOnly)
+{
+    add("a.dcm", anImageWithFrames(1));
+    add("b.dcm", anImageWithFrames(1, "1.7.1").inStudy("1.7").inSeries("1.7.7"));
+    correct(DCM_PatientName, "Right^Name", "1.2", "1.7");
+    const QByteArray moved = QByteArray(kObject).replace("studyUID=1.2", "studyUID=1.7");
+    Http::Response response = ask(moved + "contentType=application/dicom");
+    EXPECT_EQ(nameIn(bodyOf(response)), "Right^Name");
+    EXPECT_EQ(ask(moved + "contentType=image/jpeg").status, 200);
+    EXPECT_EQ(object("contentType=application/dicom").status, 404);
+    EXPECT_EQ(object("contentType=image/jpeg").status, 404);
+}
+
+TEST_F(UriTest, NeverShowsAnotherImage)
+{
+    add("a.dcm", anImageWithFrames(1));
+    const QByteArray forms[] = {"contentType=application/dicom", "contentType=image/jpeg",
+                                "contentType=application/dicom&transferSyntax=1.2.840.10008.1.2.5"};
+    write("a.dcm", anImageWithFrames(1, "1.2.3.2"));
+    for (const QByteArray& form : forms)
+        EXPECT_EQ(object(form).status, 410) << form.constData();
+    QFile::remove(path("a.dcm"));
+    for (const QByteArray& form : forms)
+        EXPECT_EQ(object(form).status, 410) << form.constData();
+}
+
+}  // namespace
