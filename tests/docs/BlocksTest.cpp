@@ -18,7 +18,7 @@ TEST_F(Blocks, AllSayInWhichLanguageTheyAreAndAreTested)
 {
     // "text" is for layouts and diagrams, which nothing can run.
     const QStringList languages =
-        QStringLiteral("c cmake console cpp ini nginx python sh text xml").split(QLatin1Char(' '));
+        QStringLiteral("c cmake console cpp ini json nginx python sh text xml").split(QLatin1Char(' '));
     for (const Block& block : allBlocks())
         EXPECT_TRUE(languages.contains(block.language))
             << block.place() << " is in \"" << block.language.toStdString()
@@ -92,6 +92,19 @@ TEST_F(Blocks, InXmlAreJobsAndInIniAreSettings)
         const Answer answer = shell({QStringLiteral("KDD_CONFIG=$PWD/kdd.ini kdd list")});
         EXPECT_EQ(answer.exitCode, 0) << block.place() << '\n' << answer.err.toStdString();
         EXPECT_FALSE(answer.err.contains("setting")) << answer.err.toStdString();
+    }
+}
+
+TEST_F(Blocks, InJsonAreAccessFiles)
+{
+    for (const Block& block : blocksIn("json")) {
+        putBeside("access.json", block.text.toUtf8());
+        // It would run for ever with a certificate.
+        const Answer answer =
+            shell({QStringLiteral("KDD_SERVER_LISTEN=127.0.0.1:0 kdd serve --access access.json "
+                                  "--tls-cert none.pem --tls-key none.pem")});
+        EXPECT_EQ(answer.exitCode, 1) << block.place() << answer.err.toStdString();
+        EXPECT_TRUE(answer.err.contains("none.pem")) << answer.err.toStdString();
     }
 }
 

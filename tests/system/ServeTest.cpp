@@ -31,6 +31,7 @@ TEST_F(Serve, SaysWhyItDoesNotBegin)
     } kRefusals[] = {
         {"serve --listen 8042", 2, "\"8042\" is no address to listen at"},
         {"serve --listen 0.0.0.0:0", 1, "0.0.0.0:0 can be reached by other machines"},
+        {"serve --access none.json", 2, "The access file cannot be followed: none.json: "},
         {"serve --tls-key key.pem", 2, "TLS takes both a certificate and a key"},
         {"serve --listen 127.0.0.1:0 --tls-cert none.pem --tls-key none.pem", 1, "none.pem: "},
         {"serve --listen 127.0.0.1:0 --viewer none", 1, "none: there is no viewer"},

@@ -189,6 +189,7 @@ void Session::prepareRequest()
 {
     mBegan = Clock::now();
     mRequest = mReader.take();
+    mCaller.clear();
     mRequest.peer = mPeer;
     mRequest.isEncrypted = qstrcmp(mTransport->scheme(), "https") == 0;
     mRequest.certificate = mTransport->peerName();
@@ -231,6 +232,7 @@ void Session::answer()
         LogFile::errorf("Request %s failed: %s", mRequest.id.constData(), fault.what());
         response = failure(500, QStringLiteral("The request failed"));
     }
+    mCaller = response.caller;
     --mHost.answering;
     write(std::move(response));
 }
@@ -242,7 +244,6 @@ void Session::write(Response response)
     form.isOldVersion = mReader.isOldVersion();
     form.keepsConnection = mReader.keepsConnection() && !mIsRefused && !mHost.stops;
     form.id = mRequest.id;
-    mCaller = response.caller;
     mWriter.emplace(std::move(response), form);
     send();
 }

@@ -232,7 +232,6 @@ void declareServe(CommandSet& commands)
         "where no other machine reaches it until --access says who may do what. What has no option here is a "
         "setting of the site, as each option is.",
         "kdd serve\n"
-        "kdd serve --listen 0.0.0.0:8443 --tls-cert tls.pem --tls-key key.pem --access access.json\n"
         "kdd serve --viewer viewer --public https://images.example.org"};
     const auto request = std::make_shared<ServeRequest>();
     ArgumentList arguments = commands.declare(

@@ -94,6 +94,7 @@ TEST_F(AccessGateTest, AsksForTheRightThatARequestTakes)
         {kDelete, "dicom-web/studies/1.2/series/1.3", Right::Delete},
         {kGet, "browser/studies/1.2/corrections", Right::Read},
         {kGet, "browser/config", Right::Read},
+        {kGet, "wado", Right::Read},
     };
     for (const auto& each : kRequests) {
         EXPECT_EQ(statusFor(each.needs, each.method, each.path), 200) << each.path;

@@ -120,6 +120,7 @@ TEST_F(ServedAccess, ShowsNothingToABadToken)
                                 image + "/frames/1",
                                 image + "/frames/1/rendered",
                                 image + "/thumbnail",
+                                "/wado?studyUID=1.2",
                                 "/browser/config",
                                 "/browser/studies/1.2",
                                 "/browser/studies/1.2/corrections",
