@@ -72,7 +72,7 @@ Verdict ShownImage::open(const ServedStudy& study, const QByteArray& key)
     if (known.bad())
         return known;
     mPath = pathText(origin.path);
-    Result unopened;  // the loader tells the reason, too
+    Result unopened;  // the loader tells the reason; what has no state here lies behind a URL
     mState = Http::OpenFile::open(origin.path, unopened);
     mFile = std::make_unique<KxDcmFileLoader>(KxDcmFileLoader::Mode::BoundedLocal);
     const OFCondition condition =
@@ -99,12 +99,14 @@ int ShownImage::frames() const
     return qMax<Sint32>(number, 1);
 }
 
-/// Long values are read by the file's name when they are asked for, which may be another file's by then.
+/// Long values of a local file are read by its name when they are asked for, which may be another file's by then.
 Verdict ShownImage::checkUnchanged() const
 {
+    if (mState == nullptr)
+        return {};
     Result result;
     const auto now = Http::OpenFile::open(pathBytes(mPath), result);
-    if (mState != nullptr && now != nullptr && now->identity() == mState->identity())
+    if (now != nullptr && now->identity() == mState->identity())
         return {};
     LogFile::errorf("%s was changed while it was read", qUtf8Printable(mPath));
     return {503, QStringLiteral("The instance's DICOM file is being changed; ask again")};
