@@ -93,6 +93,17 @@ TEST_F(ServerTest, TellsWhetherItIsReady)
     EXPECT_EQ(get(server->statusAddress(), "/readyz").status, 503);
 }
 
+TEST_F(ServerTest, KnowsOlderViewersBesideThePrefixAndBelow)
+{
+    const auto server = started();
+    for (const QByteArray path : {"/wado", "/dicom-web/wado"}) {
+        const Reply reply = get(server->address(), path + "?requestType=WADO");
+        EXPECT_EQ(reply.status, 400);
+        EXPECT_EQ(reply.body, "The parameter studyUID has to be a UID\n");
+        EXPECT_EQ(get(server->address(), path + "/1.2").status, 404);
+    }
+}
+
 TEST_F(ServerTest, CountsRequestsByGroupsOfItsOwn)
 {
     const auto server = started();
