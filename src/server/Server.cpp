@@ -83,8 +83,8 @@ struct Server::Private
         , statusGuard(settings.addresses, statusPages)
         , http(settings.http, guard, log)
     {
-        router.add(prefix,
-                   std::make_unique<DicomWeb::DicomWebService>(prefix.size(), makeResources(archive)));
+        router.add(prefix, std::make_unique<DicomWeb::DicomWebService>(prefix.size(),
+                                                                       makeResources(archive, metrics)));
         Browser::BrowserSettings browser;
         browser.dicomWeb = prefix.toList().join('/');
         browser.hasViewer = !settings.viewer.isEmpty();

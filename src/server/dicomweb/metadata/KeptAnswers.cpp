@@ -85,7 +85,9 @@ bool KeptAnswers::find(const QByteArray& name, Http::FileRange& answer)
     Result result;
     answer.file = Http::OpenFile::open(pathOf(name), result);
     // What a crash of the machine left may have a name and nothing else.
-    if (answer.file == nullptr || answer.file->size() == 0)
+    const bool isThere = answer.file != nullptr && answer.file->size() > 0;
+    ++(isThere ? mCount.hits : mCount.misses);
+    if (!isThere)
         return false;
     answer.offset = 0;
     answer.length = answer.file->size();

@@ -42,7 +42,8 @@ Verdict ObjectShelf::open(const ImageOrigin& origin, FoundObject& found)
     }
     if (!origin.isIn(opened.index)) {
         LogFile::errorf("%s cannot be served: it holds image %s of study %s", origin.path.constData(),
-                        opened.index.sopInstanceUID().constData(), opened.index.studyInstanceUID().constData());
+                        opened.index.sopInstanceUID().constData(),
+                        opened.index.studyInstanceUID().constData());
         return {410, QStringLiteral("The image's DICOM file holds another image by now")};
     }
     found = std::move(opened);
@@ -66,6 +67,7 @@ Result ObjectShelf::find(const QByteArray& path, FoundObject& found)
         if (isKnown)
             seen = *known;
     }
+    ++(isKnown ? mCount.hits : mCount.misses);
     if (!isKnown) {
         result = examine(path, found, seen);
         if (result.bad())
