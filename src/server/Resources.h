@@ -4,6 +4,7 @@
 #include "server/dicomweb/StudyShelf.h"
 #include "server/dicomweb/retrieve/ObjectShelf.h"
 #include "server/dicomweb/search/ThreadSearch.h"
+#include "server/http/Metrics.h"
 
 #include <kddlib/Kxg.h>
 
@@ -23,8 +24,9 @@ struct ServedArchive
 };
 
 /// All that answers below the prefix of DICOMweb, in the order in which they are asked whether a path is theirs. The
-/// archive outlives them.
-std::vector<std::unique_ptr<DicomWeb::Resource>> makeResources(ServedArchive& archive);
+/// archive outlives them, and `metrics`, which is told of what is kept ready, is asked for nothing once they are gone.
+std::vector<std::unique_ptr<DicomWeb::Resource>> makeResources(ServedArchive& archive,
+                                                               Http::Metrics& metrics);
 
 /// What answers beside that prefix, under the one path that older viewers know.
 std::vector<std::unique_ptr<DicomWeb::Resource>> makeUriResources(ServedArchive& archive);

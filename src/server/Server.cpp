@@ -162,8 +162,8 @@ struct Server::Private
         , statusGuard(settings.addresses, statusPages)
         , http(settings.http, guard, observers)
     {
-        router.add(prefix,
-                   std::make_unique<DicomWeb::DicomWebService>(prefix.size(), makeResources(archive)));
+        router.add(prefix, std::make_unique<DicomWeb::DicomWebService>(prefix.size(),
+                                                                       makeResources(archive, metrics)));
         router.add(Router::segmentsOf(kUriPath),
                    std::make_unique<DicomWeb::DicomWebService>(0, makeUriResources(archive)));
         Browser::BrowserSettings browser;

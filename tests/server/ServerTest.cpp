@@ -121,6 +121,7 @@ TEST_F(ServerTest, CountsRequestsByGroupsOfItsOwn)
     EXPECT_TRUE(text.contains("kdd_http_request_duration_seconds_count{route=\"metadata\"} 1\n"));
     EXPECT_TRUE(text.contains("kdd_http_request_duration_seconds_bucket{route=\"other\",le=\"+Inf\"} 4\n"));
     EXPECT_TRUE(text.contains("kdd_http_request_duration_seconds_count{route=\"other\"} 4\n"));
+    EXPECT_TRUE(text.contains("\nkdd_cache_misses_total{cache=\"studies\"} 0\n"));
     EXPECT_TRUE(text.contains("\n# TYPE kdd_http_connections gauge\nkdd_http_connections "));
     EXPECT_FALSE(text.contains("Doe") || text.contains("madeup"));
 }

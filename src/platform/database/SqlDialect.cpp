@@ -48,7 +48,8 @@ SqlDialect postgres()
     // One writer at a time, as with the other engine: else a series could be found empty and removed while another
     // transaction adds to it, and two that touch the same studies in different order would block each other.
     dialect.beginWriting
-        << QStringLiteral("BEGIN")
+        // Named, for a server may be set up for another: then a writer would not see what was written while he waited.
+        << QStringLiteral("BEGIN ISOLATION LEVEL READ COMMITTED")
         << QStringLiteral("SELECT pg_advisory_xact_lock(%1, %2)").arg(kAdvisoryLocks).arg(kWriterLock);
     // A function that looks a name up, such as to_regclass, would answer from a cache within a transaction that waited
     // for another one to make the table.

@@ -1,5 +1,7 @@
 #pragma once
 
+#include "server/http/CacheCount.h"
+
 #include <QByteArray>
 
 #include <kddlib/TagFile.h>
@@ -62,8 +64,13 @@ public:
     /// The study as its file is now.
     Presence find(const QByteArray& studyUID, std::shared_ptr<const ServedStudy>& study);
 
-    /// The version alone, without reading the tree where the file was seen before.
-    Presence version(const QByteArray& studyUID, QByteArray& version);
+    /// The version, without reading the tree where the file was seen before; `study` is null then, unless it is there
+    /// anyway.
+    Presence version(const QByteArray& studyUID, QByteArray& version,
+                     std::shared_ptr<const ServedStudy>& study);
+
+    /// How often nothing had to be read of a tag file that is there.
+    const Http::CacheCount& count() const;
 
 private:
     struct Private;
