@@ -82,7 +82,7 @@ class DatabaseFile : public Served
 TEST_F(DatabaseFile, ThatIsPutInPlaceOfAnotherIsFollowed)
 {
     addTwoStudies();
-    serve();
+    serve({QStringLiteral("--threads"), QStringLiteral("1")});
     EXPECT_TRUE(get("studies").body.contains("\"1.2\""));
     // As an older copy is put back.
     for (const char* name : {"store/kdd.sqlite", "store/kdd.sqlite-wal", "store/kdd.sqlite-shm"})

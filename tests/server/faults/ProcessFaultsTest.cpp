@@ -63,7 +63,8 @@ TEST_F(ProcessFaults, AStoreThatCanBeReadOnlyIsServedAndFollowed)
     const bool isRoot = ::geteuid() == 0;
     if (!isRoot)
         GTEST_SKIP() << "only an administrator can be another user";
-    serve({}, "", "setpriv --reuid nobody --regid nogroup --clear-groups");
+    serve({QStringLiteral("--threads"), QStringLiteral("1")}, "",
+          "setpriv --reuid nobody --regid nogroup --clear-groups");
     const auto expectServed = [this](const char* studies) {
         EXPECT_EQ(get("studies").body.count("\"00201208\""), QByteArray(studies).toInt());
         EXPECT_EQ(get("studies/1.3/metadata", kGzip).status, 200);
@@ -153,7 +154,8 @@ TEST_F(ProcessFaults, AThousandClientsThatDoNotReadTakeLittleMemory)
         clients.back()->get("/dicom-web/" + QByteArray(i % 2 == 0 ? kLarge : "studies/1.2"),
                             i % 2 == 0 ? kBytes : "");
     }
-    EXPECT_EQ(get("studies").status, 200);
+    EXPECT_TRUE(comesTrue([this] { return get("studies").status == 200; }))
+        << "when the others were answered";
     EXPECT_TRUE(get(kLarge, kBytes).isWhole);
     EXPECT_LT(memory(), 256 * 1024);
 }

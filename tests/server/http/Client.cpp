@@ -134,6 +134,8 @@ Reply Client::bodyAfter(Reply reply)
 
 QByteArray Client::certificate() const
 {
+    if (!mIsConnected)
+        return {};
     const std::unique_ptr<X509, void (*)(X509*)> shown(SSL_get1_peer_certificate(mTls.get()), X509_free);
     unsigned char* bytes = nullptr;
     const int size = i2d_X509(shown.get(), &bytes);
