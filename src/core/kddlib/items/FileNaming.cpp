@@ -49,13 +49,11 @@ bool extractUIDs(const char* path, QByteArray& sopUID, QByteArray& studyUID)
 {
     std::string_view rest;
     if (removeExtension(path, rest)) {
-        std::string_view name = lastName(rest);
+        // Without an underscore nothing is left, and nothing names no folder.
+        const std::size_t underscore = rest.rfind('_');
+        rest = rest.substr(0, underscore != std::string_view::npos ? underscore : 0);
+        const std::string_view name = lastName(rest);
         rest.remove_suffix(name.size());
-        // Without an underscore of its own the file names nothing, whatever its folders are called.
-        const std::size_t underscore = name.rfind('_');
-        if (underscore == std::string_view::npos)
-            rest = {};
-        name = name.substr(0, underscore);
         // A separator alone is the root, which has no name to be a study's UID.
         if (rest.size() > 1) {
             rest.remove_suffix(1);
