@@ -3,6 +3,7 @@
 #include "kddlib/net/http/CurlError.h"
 #include "kddlib/net/http/KxCurlDownloadStream.h"
 #include "kddlib/net/http/KxCurlHandleFactory.h"
+#include "platform/base/Result.h"
 #include "support/HttpServer.h"
 #include "support/LogCapture.h"
 #include "support/Setting.h"
@@ -37,6 +38,30 @@ protected:
         "HTTP/1.1 103 Early Hints\r\n\r\nHTTP/1.1 200 OK\r\nX-Two:  b \r\nX-TWO:c: d\r\n\r\n{\"a\": 1}"};
     Setting cloud{"KDD_CLOUD_API", server.url("")};
 };
+
+TEST_F(Client, ReadsWhatIsTrustedFromNobodyElse)
+{
+    const auto read = [this](const std::string& url, const QByteArray& caFile = {}, qint64 most = 1000) {
+        QByteArray body = "as it was";
+        const Result result = client.readTrusted(url, caFile, most, std::chrono::seconds(60), body);
+        return result.good() ? body.toStdString()
+                             : (body == "as it was" ? "" : "changed: ") + result.text().toStdString();
+    };
+    client.setSessionID("secret");
+    EXPECT_EQ(read(server.url("a")), "{\"a\": 1}");
+    EXPECT_THAT(lastRequest(), StartsWith("GET /a HTTP/1.1"));
+    EXPECT_THAT(read(server.url("a"), {}, 7), HasSubstr("a body of more than 7 bytes"));
+    EXPECT_THAT(read("http://192.0.2.1/a"), StartsWith("http://192.0.2.1/a: it is no address of HTTPS"));
+    EXPECT_THAT(read("file:///etc/hostname"), HasSubstr("no address of HTTPS"));
+    const NginxServer secure(NginxServer::Scheme::Https, "location /moved { return 302 /a; }");
+    secure.addFile("a", "of the server");
+    const Setting verifiesNobody("KDD_TLS_VERIFY", "0");
+    EXPECT_THAT(read(secure.url("a")), HasSubstr("certificate"));
+    EXPECT_EQ(read(secure.url("a"), secure.certificateFile()), "of the server");
+    EXPECT_THAT(read(secure.url("moved"), secure.certificateFile()), HasSubstr("HTTP response code 302"));
+    const Setting trusted("KDD_TLS_CA_FILE", secure.certificateFile().toStdString());
+    EXPECT_EQ(read(secure.url("a")), "of the server");
+}
 
 TEST(ClientNames, AreToldFromFilesByTheirFirstLettersAndLeadToTheWebService)
 {
