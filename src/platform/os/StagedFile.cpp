@@ -64,9 +64,14 @@ SystemResult StagedFile::append(const char* bytes, qint64 count)
     return {};
 }
 
+void StagedFile::startFlush() const
+{
+    ::sync_file_range(mDescriptor, 0, 0, SYNC_FILE_RANGE_WRITE);
+}
+
 SystemResult StagedFile::flush()
 {
-    const SystemResult flushed = resultOf(::fdatasync(mDescriptor));
+    SystemResult flushed = resultOf(::fdatasync(mDescriptor));
     close();
     return flushed;
 }

@@ -22,6 +22,9 @@ public:
 
     SystemResult append(const char* bytes, qint64 count);
 
+    /// Has the system begin to write, so that flushing waits for less.
+    void startFlush() const;
+
     /// What was written is on the disk from here on, and nothing more is written.
     SystemResult flush();
 

@@ -15,6 +15,8 @@
 
 #include <gtest/gtest.h>
 
+#include <thread>
+
 using namespace Kdd;
 
 namespace
@@ -58,10 +60,12 @@ protected:
 
     static ArrivedObject store(ObjectStore& store, Kxg::Catalogue& catalogue, const DatasetBuilder& image)
     {
-        const auto arrival = store.begin();
+        std::vector<std::unique_ptr<ObjectArrival>> arrivals;
+        arrivals.push_back(store.begin());
         const QByteArray bytes = fileOf(image);
-        arrival->take(bytes.constData(), bytes.size());
-        return store.commit(*arrival, catalogue);
+        arrivals[0]->take(bytes.constData(), bytes.size());
+        arrivals[0]->end();
+        return store.commit(arrivals, catalogue).at(0);
     }
 
     QStringList filesBelow(const char* folder) const
@@ -124,6 +128,29 @@ TEST_F(ObjectStoreTest, MergesArrivalsWithoutOpeningTheirFilesAgain)
     TagFile file;
     ASSERT_TRUE(file.readCacheFileForStudy("1.2", false));
     EXPECT_EQ(file.imagesByUID().size(), 3);
+}
+
+TEST_F(ObjectStoreTest, TakesWhatTwoSendInOppositeOrderOnce)
+{
+    ArrivedStudies studies;
+    const auto objects = open(studies);
+    catalogue();
+    const auto send = [&](bool isReversed) {
+        std::vector<std::unique_ptr<ObjectArrival>> arrivals;
+        for (int i = 0; i < 40; ++i) {
+            // Each twice, too.
+            const int number = (isReversed ? 39 - i : i) / 2;
+            const QByteArray bytes = fileOf(anImage(("1.2.3." + QByteArray::number(number)).constData()));
+            arrivals.push_back(objects->begin());
+            arrivals.back()->take(bytes.constData(), bytes.size());
+        }
+        for (const ArrivedObject& object : objects->commit(arrivals, *catalogue()))
+            EXPECT_TRUE(object.isStored()) << object.reason.toStdString();
+    };
+    std::thread other([&] { send(true); });
+    send(false);
+    other.join();
+    EXPECT_EQ(filesBelow("objects/1.2").size(), 20);
 }
 
 TEST_F(ObjectStoreTest, LeavesAloneWhatAnotherProcessCompletes)
@@ -195,10 +222,11 @@ TEST_F(ObjectStoreTest, TellsThatTheDiskIsFullAndLeavesNothing)
     const DatasetBuilder large = anImage("1.2.3.1").words(std::vector<Uint16>(100000, 7));
     const QByteArray bytes = fileOf(large);
     {
-        const auto arrival = objects->begin();
+        std::vector<std::unique_ptr<ObjectArrival>> arrivals;
+        arrivals.push_back(objects->begin());
         const FullDisk full(50000);
-        EXPECT_FALSE(arrival->take(bytes.constData(), bytes.size()));
-        EXPECT_EQ(objects->commit(*arrival, *database).fault, ArrivalFault::OutOfSpace);
+        EXPECT_FALSE(arrivals[0]->take(bytes.constData(), bytes.size()));
+        EXPECT_EQ(objects->commit(arrivals, *database).at(0).fault, ArrivalFault::OutOfSpace);
     }
     EXPECT_FALSE(QDir(mFolder.filePath("objects/1.2")).exists());
     EXPECT_EQ(filesBelow("objects/.incoming").filter(QStringLiteral("/1")), QStringList());

@@ -46,7 +46,7 @@ struct PendingStudy
 
 struct Queued
 {
-    DicomInput image;
+    std::vector<DicomInput> images;
     Result result;
     bool isDone = false;
 };
@@ -61,7 +61,7 @@ struct ArrivedStudies::Private
     std::unique_ptr<PendingStudy> take(const QByteArray& studyUID);
     std::unique_ptr<PendingStudy> takeLocked(const QByteArray& studyUID);
     Result finish(const QByteArray& studyUID, Kxg::Catalogue& catalogue, int patienceMs);
-    void conclude(const QByteArray& studyUID, bool isDone, Clock::duration took);
+    void conclude(const QByteArray& studyUID, bool isDone, Clock::duration time);
 
     Pace pace;
 
@@ -123,16 +123,20 @@ Result ArrivedStudies::Private::registerQueued(Kxg::Catalogue& catalogue)
     }
     Registration registration(catalogue);
     Result result;
-    for (const Queued* each : taken)
-        result = result.good() ? registration.add(each->image) : result;
+    for (const Queued* each : taken) {
+        for (const DicomInput& image : each->images)
+            result = result.good() ? registration.add(image) : result;
+    }
     if (result.good())
         result = registration.flush();
     const std::lock_guard<std::mutex> lock(mutex);
     for (const QByteArray& studyUID : registration.studies())
         obtain(studyUID);
     for (Queued* each : taken) {
-        if (result.good())
-            keep(each->image, registration);
+        for (DicomInput& image : each->images) {
+            if (result.good())
+                keep(image, registration);
+        }
         each->result = result;
         each->isDone = true;
     }
@@ -153,10 +157,10 @@ ArrivedStudies::ArrivedStudies(Pace pace)
 
 ArrivedStudies::~ArrivedStudies() = default;
 
-Result ArrivedStudies::add(DicomInput image, Kxg::Catalogue& catalogue)
+Result ArrivedStudies::add(std::vector<DicomInput> images, Kxg::Catalogue& catalogue)
 {
     Queued entry;
-    entry.image = std::move(image);
+    entry.images = std::move(images);
     {
         const std::lock_guard<std::mutex> lock(d->mutex);
         d->queued.push_back(&entry);
@@ -306,7 +310,7 @@ Result ArrivedStudies::complete(const QByteArray& studyUID, Kxg::Catalogue& cata
         d->running.insert(studyUID);
     }
     const Clock::time_point began = Clock::now();
-    const Result result = d->finish(studyUID, catalogue, patienceMs);
+    Result result = d->finish(studyUID, catalogue, patienceMs);
     d->conclude(studyUID, result.good(), Clock::now() - began);
     return result;
 }

@@ -9,6 +9,7 @@
 
 #include <chrono>
 #include <memory>
+#include <vector>
 
 namespace Kxg
 {
@@ -40,8 +41,8 @@ public:
     /// What was not completed by then waits in the database's queue.
     ~ArrivedStudies();
 
-    /// Registers an image. Success: it is registered for good.
-    Result add(DicomInput image, Kxg::Catalogue& catalogue);
+    /// Registers images. Success: they are registered for good.
+    Result add(std::vector<DicomInput> images, Kxg::Catalogue& catalogue);
 
     /// Of a study that waits for a reason that is not known here; it is due at once.
     void addWaiting(const QByteArray& studyUID);

@@ -3,22 +3,22 @@
 #include "kddlib/archive/ArrivedStudies.h"
 #include "kddlib/archive/DicomInput.h"
 #include "kddlib/archive/FileWalk.h"
-#include "kddlib/archive/ObjectContent.h"
+#include "kddlib/archive/ObjectPlaces.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
-#include "platform/os/FileStatus.h"
 #include "platform/os/PathName.h"
 #include "platform/os/StagedFile.h"
 
-#include <QCryptographicHash>
 #include <QDir>
+#include <QSet>
 #include <QUuid>
 
-#include <dcmtk/dcmdata/dcdeftag.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <atomic>
 #include <cerrno>
+#include <map>
 
 namespace Kdd
 {
@@ -26,44 +26,8 @@ namespace Kdd
 namespace
 {
 
-// Within the folder of the objects, so that both are on one disk: a file gets its place by a second name.
-const QByteArray kStaging = "/.incoming";
-
 /// How much may come before the disk is looked at again [bytes].
 constexpr qint64 kRoomStep = 16 * 1024 * 1024;
-
-/// Longer UIDs are none, and nobody could ask for the object.
-constexpr int kLongestUid = 64;
-
-/// Files of one SOP Instance UID in a series, each of other content.
-constexpr int kMostVersions = 1000;
-
-ArrivalFault faultOf(const SystemResult& result)
-{
-    const int error = result.error();
-    return error == ENOSPC || error == EDQUOT || error == EFBIG ? ArrivalFault::OutOfSpace
-                                                                : ArrivalFault::Failed;
-}
-
-/// Whether it can be the name of a file or folder: readDicomInput lets only letters, digits, points, hyphens and
-/// underscores through.
-bool isName(const QByteArray& uid)
-{
-    return !uid.isEmpty() && uid.size() <= kLongestUid && !uid.startsWith('.');
-}
-
-QByteArray nameOf(const QByteArray& sopUID, int version)
-{
-    // In the order of their names the later ones come behind, as whoever takes in the folder anew wants it.
-    return version == 1 ? sopUID + ".dcm"
-                        : sopUID + '_' + QByteArray::number(version).rightJustified(4, '0') + ".dcm";
-}
-
-void refuse(ArrivedObject& object, ArrivalFault fault, const QString& reason)
-{
-    object.fault = fault;
-    object.reason = reason;
-}
 
 }  // namespace
 
@@ -114,52 +78,41 @@ bool ObjectArrival::take(const char* bytes, qint64 count)
     return written.good() || d->refuse(faultOf(written), written.text());
 }
 
+void ObjectArrival::end()
+{
+    d->file.startFlush();
+}
+
 // ---- the store
 
 struct ObjectStore::Private
 {
-    explicit Private(ArrivedStudies& arrived)
+    Private(const ObjectRules& wanted, ArrivedStudies& arrived)
         : studies(arrived)
+        , rules(wanted)
+        , places(wanted)
     {
     }
 
-    QByteArray folderOf(const ArrivedObject& object) const
-    {
-        return rules.folder + '/' + object.studyUID + '/' + object.seriesUID;
-    }
-    Result lock(LockFile& held, const DicomInput& input, const QByteArray& sopUID) const;
     Result makeStaging();
-    bool check(DicomInput& input, const QByteArray& studyUID, ArrivedObject& object) const;
-    bool settleWithKnown(DicomInput& input, Kxg::Catalogue& catalogue, ArrivedObject& object) const;
-    bool place(StagedFile& file, DicomInput& input, ArrivedObject& object) const;
-    void tellPlace(const QByteArray& path, Kxg::Catalogue& catalogue, ArrivedObject& object) const;
     Result recover(const QByteArray& folder, Kxg::Catalogue& catalogue);
     Result recoverFile(const QByteArray& path, Kxg::Catalogue& catalogue);
 
     ArrivedStudies& studies;
-    ObjectRules rules;
+    const ObjectRules rules;
+    const ObjectPlaces places;
     QByteArray staging;  // of this process alone
     LockFile life;       // by which others know that it still lives
     std::atomic<quint64> count{0};
 };
 
-/// The right to decide about objects of one UID.
-Result ObjectStore::Private::lock(LockFile& held, const DicomInput& input, const QByteArray& sopUID) const
-{
-    const QByteArray digest =
-        QCryptographicHash::hash(input.studyUID + ' ' + sopUID, QCryptographicHash::Md5).toHex();
-    // So many that two objects seldom meet, and so few that nobody has to remove them.
-    return held.acquire(rules.folder + kStaging + "/locks/" + digest.left(2), LockFile::IfHeld::Wait);
-}
-
 Result ObjectStore::Private::makeStaging()
 {
     LockFile turn;  // so that nobody takes a folder for one that is left that was made a moment ago
-    const QByteArray locks = rules.folder + kStaging + "/locks";
-    SystemResult made = makeLastingFolder(locks);
+    SystemResult made = makeLastingFolder(places.locks());
     if (made.good())
-        made = turn.acquire(locks + "/servers", LockFile::IfHeld::Wait);
-    staging = rules.folder + kStaging + '/' + QUuid::createUuid().toByteArray(QUuid::Id128);
+        made = turn.acquire(places.locks() + "/servers", LockFile::IfHeld::Wait);
+    staging = places.staging() + '/' + QUuid::createUuid().toByteArray(QUuid::Id128);
     if (made.good())
         made = makeLastingFolder(staging);
     if (made.good())
@@ -183,9 +136,9 @@ ObjectStore::~ObjectStore()
 std::unique_ptr<ObjectStore> ObjectStore::open(const ObjectRules& rules, ArrivedStudies& studies,
                                                Result& result)
 {
-    auto made = std::make_unique<Private>(studies);
-    made->rules = rules;
-    made->rules.folder = absolutePath(rules.folder);
+    ObjectRules known = rules;
+    known.folder = absolutePath(rules.folder);
+    auto made = std::make_unique<Private>(known, studies);
     result = made->makeStaging();
     if (result.bad())
         return nullptr;
@@ -215,151 +168,141 @@ std::unique_ptr<ObjectArrival> ObjectStore::begin()
     return std::unique_ptr<ObjectArrival>(new ObjectArrival(std::move(made)));
 }
 
-/// What the object is, and whether it is what it says.
-bool ObjectStore::Private::check(DicomInput& input, const QByteArray& studyUID, ArrivedObject& object) const
+// ---- what has come whole
+
+/// Objects on their way into the archive: what costs a wait for the disk or the database is done for all of them at once.
+class ObjectStore::Batch
 {
-    ObjectMeta meta;
-    const Result known = readMeta(input.path, meta);
-    object.sopClassUID = meta.sopClassUID;
-    object.sopInstanceUID = isName(meta.sopInstanceUID) ? meta.sopInstanceUID : QByteArray();
-    if (known.bad()) {
-        refuse(object, ArrivalFault::NotDicom, known.text());
-        return false;
+public:
+    Batch(Private& store, Kxg::Catalogue& catalogue)
+        : mStore(store)
+        , mCatalogue(catalogue)
+    {
     }
-    input = readDicomInput(input.path, Damage::Refused);
-    if (input.kind != DicomInput::Kind::Image) {
-        refuse(object, ArrivalFault::NotDicom,
-               input.reason.isEmpty() ? QStringLiteral("It is no DICOM object") : input.reason);
-        return false;
+
+    /// Reads, checks and flushes each.
+    void prepare(std::vector<std::unique_ptr<ObjectArrival>>& arrivals, const QByteArray& studyUID);
+    void store();
+    std::vector<ArrivedObject> take();
+
+private:
+    struct Entry
+    {
+        StagedFile* file = nullptr;
+        DicomInput input;
+        ArrivedObject object;
+    };
+
+    bool lock(Entry& entry);
+    void finish();
+
+    Private& mStore;
+    Kxg::Catalogue& mCatalogue;
+    std::vector<Entry> mEntries;
+    std::vector<Entry*> mPlaced;  // and not registered yet
+    std::map<QByteArray, LockFile> mLocks;
+};
+
+void ObjectStore::Batch::prepare(std::vector<std::unique_ptr<ObjectArrival>>& arrivals,
+                                 const QByteArray& studyUID)
+{
+    for (const auto& arrival : arrivals) {
+        ObjectArrival::Private& received = *arrival->d;
+        Entry entry;
+        entry.file = &received.file;
+        entry.input.path = received.file.path();
+        if (received.fault != ArrivalFault::None)
+            refuse(entry.object, received.fault, received.reason);
+        else
+            ObjectPlaces::check(entry.input, studyUID, entry.object);
+        mEntries.push_back(std::move(entry));
     }
-    object.studyUID = input.studyUID;
-    object.seriesUID = input.seriesUID;
-    object.image = input.map->uid(TagMap::ImageLevel);
-    object.sopInstanceUID = object.image;
-    input.map->findAndGetString(DCM_SOPClassUID, object.sopClassUID);
-    if (!isName(object.image) || !isName(object.studyUID) || !isName(object.seriesUID))
-        refuse(object, ArrivalFault::NotDicom,
-               QStringLiteral("A UID of it is missing or cannot serve as one"));
-    else if (object.image != meta.sopInstanceUID || object.sopClassUID != meta.sopClassUID)
-        refuse(object, ArrivalFault::Mismatch,
-               QStringLiteral("Its meta information names another object or class than its dataset"));
-    else if (!studyUID.isEmpty() && object.studyUID != studyUID)
-        refuse(object, ArrivalFault::OtherStudy,
-               QStringLiteral("It is of another study than it was sent to"));
-    return object.isStored();
+    // Apart from the reading: while the first one is waited for the others are written too.
+    for (Entry& entry : mEntries) {
+        const SystemResult flushed = entry.object.isStored() ? entry.file->flush() : SystemResult();
+        if (flushed.bad())
+            refuse(entry.object, faultOf(flushed), flushed.text());
+    }
 }
 
-/// Against the files of this image that the archive has. False when nothing more is to be done.
-bool ObjectStore::Private::settleWithKnown(DicomInput& input, Kxg::Catalogue& catalogue,
-                                           ArrivedObject& object) const
+/// The right to decide about the object. Nobody waits for it while he has others, or two would wait for each other.
+bool ObjectStore::Batch::lock(Entry& entry)
 {
-    QVector<Kxg::KeptFile> files;
-    const Result asked = catalogue.imageFiles(object.studyUID, object.image, files);
-    if (asked.bad()) {
-        refuse(object, ArrivalFault::Failed, asked.text());
-        return false;
+    const QByteArray path = mStore.places.lockOf(entry.object);
+    // One that is sent twice is decided about twice.
+    const bool isThere = std::any_of(mPlaced.begin(), mPlaced.end(), [&](const Entry* placed) {
+        return placed->object.studyUID == entry.object.studyUID && placed->object.image == entry.object.image;
+    });
+    if (mLocks.count(path) > 0 && !isThere)
+        return true;
+    if (isThere || mLocks[path].acquire(path, LockFile::IfHeld::Fail).bad()) {
+        mLocks.erase(path);
+        finish();
+        const SystemResult waited = mLocks[path].acquire(path, LockFile::IfHeld::Wait);
+        if (waited.bad())
+            refuse(entry.object, ArrivalFault::Failed, waited.text());
     }
-    for (const Kxg::KeptFile& file : qAsConst(files)) {
-        if (!file.isShown)
+    return entry.object.isStored();
+}
+
+void ObjectStore::Batch::store()
+{
+    for (Entry& entry : mEntries) {
+        if (entry.object.isStored() && lock(entry) &&
+            mStore.places.settleWithKnown(entry.input, mCatalogue, entry.object) &&
+            mStore.places.place(*entry.file, entry.input, entry.object))
+            mPlaced.push_back(&entry);
+    }
+    finish();
+}
+
+/// Registers what has its place, and lets go of the rights.
+void ObjectStore::Batch::finish()
+{
+    Result result;
+    QSet<QByteArray> folders;
+    for (const Entry* entry : mPlaced)
+        folders.insert(mStore.places.folderOf(entry->object));
+    for (const QByteArray& folder : qAsConst(folders))
+        result = result.good() ? Result(flushFolder(folder)) : result;
+    std::vector<DicomInput> images;
+    std::vector<QByteArray> paths;
+    for (Entry* entry : mPlaced) {
+        paths.push_back(entry->input.path);
+        images.push_back(std::move(entry->input));
+    }
+    if (result.good() && !images.empty())
+        result = mStore.studies.add(std::move(images), mCatalogue);
+    for (std::size_t i = 0; i < mPlaced.size(); ++i) {
+        ArrivedObject& object = mPlaced[i]->object;
+        if (result.good()) {
+            ObjectPlaces::tellShown(paths[i], mCatalogue, object);
             continue;
-        if (isSameObject(input.path, file.path)) {
-            object.isKnown = true;
-            object.studyUID = file.shownStudyUID;
-            object.seriesUID = file.shownSeriesUID;
-            object.image = file.shownImage;
-            return false;
         }
-        ObjectMeta meta;
-        // What was there and is gone, or cannot be read any more, stands in nobody's way.
-        const bool isThere = readMeta(file.path, meta).good() && meta.sopInstanceUID == object.sopInstanceUID;
-        if (isThere && rules.sameUid == SameUid::Refuse) {
-            refuse(object, ArrivalFault::OtherContent,
-                   QStringLiteral("The study has another object of this SOP Instance UID"));
-            return false;
-        }
-    }
-    return true;
-}
-
-/// Gives the file its place, or finds the place that it has already: a server died before it registered it, or it was
-/// removed from the archive, which leaves files where they are.
-bool ObjectStore::Private::place(StagedFile& file, DicomInput& input, ArrivedObject& object) const
-{
-    const QByteArray folder = folderOf(object);
-    SystemResult placed = file.flush();
-    if (placed.good())
-        placed = makeLastingFolder(folder);
-    for (int version = 1; placed.good() && version <= kMostVersions; ++version) {
-        const QByteArray path = folder + '/' + nameOf(object.image, version);
-        placed = file.linkTo(path);
-        if (placed.error() == EEXIST) {
-            placed = {};
-            if (!isSameObject(file.path(), path))
-                continue;
-        }
-        if (placed.good())
-            placed = flushFolder(folder);
-        FileStatus status;
-        if (placed.good() && statusOf(path.constData(), status)) {
-            input.path = path;
-            input.stamp = {status.size, status.modified};
-            return true;
-        }
-    }
-    if (placed.good())
-        refuse(object, ArrivalFault::Failed, QStringLiteral("There are too many objects of this UID"));
-    else
-        refuse(object, faultOf(placed), placed.text());
-    return false;
-}
-
-/// A correction may show it elsewhere than its file says. What cannot be asked is told as the file has it.
-void ObjectStore::Private::tellPlace(const QByteArray& path, Kxg::Catalogue& catalogue,
-                                     ArrivedObject& object) const
-{
-    QVector<Kxg::KeptFile> files;
-    if (catalogue.imageFiles(object.studyUID, object.image, files).bad())
-        return;
-    for (const Kxg::KeptFile& file : qAsConst(files)) {
-        if (file.path != path)
-            continue;
-        object.studyUID = file.shownStudyUID;
-        object.seriesUID = file.shownSeriesUID;
-        object.image = file.shownImage;
-        return;
-    }
-}
-
-ArrivedObject ObjectStore::commit(ObjectArrival& arrival, Kxg::Catalogue& catalogue,
-                                  const QByteArray& studyUID)
-{
-    ArrivedObject object;
-    DicomInput input;
-    StagedFile& file = arrival.d->file;
-    input.path = file.path();
-    if (arrival.d->fault != ArrivalFault::None) {
-        refuse(object, arrival.d->fault, arrival.d->reason);
-        return object;
-    }
-    LockFile turn;
-    if (!d->check(input, studyUID, object))
-        return object;
-    const Result locked = d->lock(turn, input, object.image);
-    if (locked.bad())
-        refuse(object, ArrivalFault::Failed, locked.text());
-    if (!object.isStored() || !d->settleWithKnown(input, catalogue, object) || !d->place(file, input, object))
-        return object;
-    const QByteArray path = input.path;
-    const Result registered = d->studies.add(std::move(input), catalogue);
-    if (registered.bad()) {
         // It may be registered all the same, when the answer was lost: the file stays, and so does its first name, from
         // which it is known what to do with it.
-        file.keep();
-        refuse(object, ArrivalFault::Failed, registered.text());
-        return object;
+        mPlaced[i]->file->keep();
+        refuse(object, ArrivalFault::Failed, result.text());
     }
-    d->tellPlace(path, catalogue, object);
-    return object;
+    mPlaced.clear();
+    mLocks.clear();
+}
+
+std::vector<ArrivedObject> ObjectStore::Batch::take()
+{
+    std::vector<ArrivedObject> objects;
+    for (Entry& entry : mEntries)
+        objects.push_back(std::move(entry.object));
+    return objects;
+}
+
+std::vector<ArrivedObject> ObjectStore::commit(std::vector<std::unique_ptr<ObjectArrival>>& arrivals,
+                                               Kxg::Catalogue& catalogue, const QByteArray& studyUID)
+{
+    Batch batch(*d, catalogue);
+    batch.prepare(arrivals, studyUID);
+    batch.store();
+    return batch.take();
 }
 
 // ---- what was left
@@ -367,8 +310,8 @@ ArrivedObject ObjectStore::commit(ObjectArrival& arrival, Kxg::Catalogue& catalo
 Result ObjectStore::recover(Kxg::Catalogue& catalogue)
 {
     LockFile turn;
-    const QByteArray root = d->rules.folder + kStaging;
-    Result result = turn.acquire(root + "/locks/servers", LockFile::IfHeld::Wait);
+    const QByteArray root = d->places.staging();
+    Result result = turn.acquire(d->places.locks() + "/servers", LockFile::IfHeld::Wait);
     const QStringList folders = QDir(pathText(root)).entryList(QDir::Dirs | QDir::NoDotAndDotDot);
     for (const QString& name : folders) {
         const QByteArray folder = root + '/' + pathBytes(name);
@@ -402,29 +345,25 @@ Result ObjectStore::Private::recoverFile(const QByteArray& path, Kxg::Catalogue&
     DicomInput input;
     LockFile turn;
     input.path = path;
-    Result result;
-    if (!check(input, {}, object))
-        return result;
-    result = lock(turn, input, object.image);
+    if (!ObjectPlaces::check(input, {}, object))
+        return {};
     QVector<Kxg::KeptFile> files;
+    Result result = turn.acquire(places.lockOf(object), LockFile::IfHeld::Wait);
     if (result.good())
         result = catalogue.imageFiles(object.studyUID, object.image, files);
-    for (int version = 1; result.good() && version <= kMostVersions; ++version) {
-        const QByteArray place = folderOf(object) + '/' + nameOf(object.image, version);
-        if (!isSameFile(path, place))
-            continue;
-        const bool isRegistered = std::any_of(files.begin(), files.end(),
-                                              [&](const Kxg::KeptFile& file) { return file.path == place; });
-        if (isRegistered)
-            return {};
-        if (!files.isEmpty())
-            return SystemResult::of(QFile::remove(pathText(place)) ? 0 : errno);
-        LogFile::warnf("%s was stored by a server that ended before it told so; it is taken in now",
-                       place.constData());
-        input.path = place;
-        return studies.add(std::move(input), catalogue);
-    }
-    return result;
+    const QByteArray place = places.placeOf(path, object);
+    const bool isRegistered = std::any_of(files.begin(), files.end(),
+                                          [&](const Kxg::KeptFile& file) { return file.path == place; });
+    if (result.bad() || place.isEmpty() || isRegistered)
+        return result;
+    if (!files.isEmpty())
+        return SystemResult::of(::unlink(place.constData()) == 0 ? 0 : errno);
+    LogFile::warnf("%s was stored by a server that ended before it told so; it is taken in now",
+                   place.constData());
+    input.path = place;
+    std::vector<DicomInput> images;
+    images.push_back(std::move(input));
+    return studies.add(std::move(images), catalogue);
 }
 
 }  // namespace Kdd

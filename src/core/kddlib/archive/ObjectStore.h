@@ -7,6 +7,7 @@
 #include <QString>
 
 #include <memory>
+#include <vector>
 
 namespace Kxg
 {
@@ -71,8 +72,11 @@ public:
     ObjectArrival(const ObjectArrival&) = delete;
     ObjectArrival& operator=(const ObjectArrival&) = delete;
 
-    /// Goes straight to the disk. False: no more can be taken, and committing will tell why.
+    /// Goes to the disk as it comes. False: no more can be taken, and committing will tell why.
     bool take(const char* bytes, qint64 count);
+
+    /// It has come whole: the disk may begin with it.
+    void end();
 
 private:
     friend class ObjectStore;
@@ -107,14 +111,17 @@ public:
     /// Begins to receive an object; also when it cannot be received, which committing will tell.
     std::unique_ptr<ObjectArrival> begin();
 
-    /// Stores an object that has come whole. With `studyUID` not empty it has to be of that study. Its order: the header is
-    /// read and checked, the file is flushed and gets its place, it is registered.
-    ArrivedObject commit(ObjectArrival& arrival, Kxg::Catalogue& catalogue, const QByteArray& studyUID = {});
+    /// Stores objects that have come whole, what costs a wait for disk or database for all of them at once, and tells of each
+    /// what became of it. With `studyUID` not empty they have to be of that study. In this order: headers are read and
+    /// checked, the files are flushed and get their places, they are registered.
+    std::vector<ArrivedObject> commit(std::vector<std::unique_ptr<ObjectArrival>>& arrivals,
+                                      Kxg::Catalogue& catalogue, const QByteArray& studyUID = {});
 
     /// Looks after what servers left that died: what was whole is taken in, the rest goes. Failure: that of the database.
     Result recover(Kxg::Catalogue& catalogue);
 
 private:
+    class KDD_LOCAL Batch;
     struct KDD_LOCAL Private;
     explicit ObjectStore(std::unique_ptr<Private> made);
     std::unique_ptr<Private> d;
