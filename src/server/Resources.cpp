@@ -8,6 +8,7 @@
 #include "server/dicomweb/retrieve/InstancesResource.h"
 #include "server/dicomweb/search/ChangeFeed.h"
 #include "server/dicomweb/search/SearchResource.h"
+#include "server/dicomweb/store/StoreResource.h"
 
 #include <kddlib/ExResource.h>
 #include <kddlib/PathName.h>
@@ -41,6 +42,8 @@ std::vector<std::unique_ptr<DicomWeb::Resource>> makeResources(ServedArchive& ar
     resources.push_back(std::make_unique<BulkDataResource>(archive.studies, archive.objects));
     resources.push_back(std::make_unique<ThumbnailResource>(*archive.studies));
     resources.push_back(std::make_unique<RenderedResource>(*archive.studies));
+    if (archive.arrivals != nullptr)
+        resources.push_back(std::make_unique<StoreResource>(*archive.arrivals, archive.storeLimits));
     return resources;
 }
 

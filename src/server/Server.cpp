@@ -75,7 +75,7 @@ public:
 
 struct Server::Private
 {
-    explicit Private(const ServerSettings& settings)
+    Private(const ServerSettings& settings, std::unique_ptr<DicomWeb::ArrivalService> arrivals)
         : prefix(Router::segmentsOf(settings.prefix))
         , log(metrics, prefix, settings.slow)
         , statusPages(metrics)
@@ -83,6 +83,10 @@ struct Server::Private
         , statusGuard(settings.addresses, statusPages)
         , http(settings.http, guard, log)
     {
+        stopTime = settings.http.stop;
+        archive.arrivals = std::move(arrivals);
+        archive.storeLimits = settings.store;
+        archive.studies->setArrivals(archive.arrivals.get());
         router.add(prefix,
                    std::make_unique<DicomWeb::DicomWebService>(prefix.size(), makeResources(archive)));
         Browser::BrowserSettings browser;
@@ -99,6 +103,7 @@ struct Server::Private
     }
 
     QVector<QByteArray> prefix;
+    std::chrono::milliseconds stopTime;
     ServedArchive archive;
     Http::Metrics metrics;
     RequestLog log;
@@ -122,10 +127,13 @@ std::unique_ptr<Server> Server::make(ServerSettings settings, Result& result)
     const QVector<QByteArray> viewerPath = Router::segmentsOf(kViewerPath);
     if (result.good() && !settings.viewer.isEmpty())
         viewer = ViewerFiles::open(settings.viewer, viewerPath.size(), result);
+    std::unique_ptr<DicomWeb::ArrivalService> arrivals;
+    if (result.good() && settings.objects)
+        arrivals = DicomWeb::ArrivalService::make(*settings.objects, Kxg::DatabaseServer(), result);
     if (result.bad())
         return nullptr;
     settings.http.connections = affordableConnections(settings.http.connections);
-    auto made = std::make_unique<Private>(settings);
+    auto made = std::make_unique<Private>(settings, std::move(arrivals));
     if (viewer != nullptr)
         made->router.add(viewerPath, std::move(viewer));
     return std::unique_ptr<Server>(new Server(std::move(made)));
@@ -145,6 +153,8 @@ Result Server::start()
         result = d->status->start();
     if (result.bad())
         stop();
+    else if (d->archive.arrivals != nullptr)
+        d->archive.arrivals->start();
     return result;
 }
 
@@ -152,6 +162,8 @@ Result Server::start()
 void Server::stop()
 {
     d->http.stop();
+    if (d->archive.arrivals != nullptr)
+        d->archive.arrivals->stop(d->stopTime);
     if (d->status != nullptr)
         d->status->stop();
 }

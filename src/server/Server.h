@@ -1,6 +1,7 @@
 #pragma once
 
 #include "server/access/AddressGuard.h"
+#include "server/dicomweb/store/StoreBody.h"
 #include "server/http/HttpSettings.h"
 
 #include <QString>
@@ -18,8 +19,10 @@ struct ServerSettings
     Http::HttpSettings http;
     std::optional<Http::ListenAddress> status;  ///< of a listener for those who watch the server
     Access::AddressRules addresses;
-    QByteArray prefix = "/dicom-web";      ///< of the paths of DICOMweb
-    QString viewer;                        ///< folder of a viewer's files, served under /viewer; empty: none
+    QByteArray prefix = "/dicom-web";    ///< of the paths of DICOMweb
+    QString viewer;                      ///< folder of a viewer's files, served under /viewer; empty: none
+    std::optional<ObjectRules> objects;  ///< that are taken; without it none are
+    DicomWeb::StoreLimits store;
     std::chrono::milliseconds slow{2000};  ///< requests that take longer are told in the log
 };
 

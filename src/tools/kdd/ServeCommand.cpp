@@ -1,6 +1,7 @@
 #include "server/Server.h"
 #include "tools/kdd/Commands.h"
 #include "tools/kdd/Report.h"
+#include "tools/kdd/Store.h"
 
 #include <QFile>
 
@@ -32,6 +33,7 @@ struct ServeRequest
     QString viewer;
     QByteArray publicAddress;
     QList<QByteArray> hosts;
+    bool stow = false;
 };
 
 /// While it lives the signals that end a process wait to be asked for, by threads that are started meanwhile too.
@@ -112,8 +114,26 @@ void readLimits(const ServeRequest& request, Http::HttpSettings& http)
     http.stop = std::chrono::seconds(ExResource::serverStop());
 }
 
+bool readObjectRules(const GlobalOptions& options, ServerSettings& settings)
+{
+    constexpr qint64 kMiB = 1024 * 1024;
+    const QByteArray sameUid = ExResource::sameUid();
+    if (sameUid != "refuse" && sameUid != "replace") {
+        LogFile::errorf("What becomes of objects of the same UID is \"refuse\" or \"replace\", not \"%s\"",
+                        sameUid.constData());
+        return false;
+    }
+    ObjectRules& rules = settings.objects.emplace();
+    rules.folder = objectFolder(options);
+    rules.sameUid = sameUid == "replace" ? SameUid::Replace : SameUid::Refuse;
+    rules.freeBytes = ExResource::freeSpace() * kMiB;
+    rules.objectBytes = ExResource::objectSize() * kMiB;
+    settings.store.requestBytes = ExResource::serverRequestSize() * kMiB;
+    return true;
+}
+
 /// False, with the reason logged, when something is written that is none.
-bool readSettings(const ServeRequest& request, ServerSettings& settings)
+bool readSettings(const GlobalOptions& options, const ServeRequest& request, ServerSettings& settings)
 {
     const QByteArray status = orElse(request.status, ExResource::serverStatus());
     if (!readAddress(orElse(request.listen, ExResource::serverListen()), settings.http.address) ||
@@ -128,7 +148,7 @@ bool readSettings(const ServeRequest& request, ServerSettings& settings)
     settings.addresses.publicAddress = orElse(request.publicAddress, ExResource::serverPublicAddress());
     settings.addresses.hosts = wordsOf(ExResource::serverHosts()) + request.hosts.toVector();
     settings.addresses.proxies = wordsOf(ExResource::serverProxies());
-    return true;
+    return !(request.stow || ExResource::serverTakesObjects()) || readObjectRules(options, settings);
 }
 
 void tellAddress(const GlobalOptions& options, const Server& server)
@@ -156,7 +176,7 @@ void warnOfNoArchive()
 Outcome runServe(const GlobalOptions& options, const ServeRequest& request)
 {
     ServerSettings settings;
-    if (!readSettings(request, settings))
+    if (!readSettings(options, request, settings))
         return Outcome::WrongUsage;
     const EndSignals end;
     Result result;
@@ -202,6 +222,7 @@ void declareServe(CommandSet& commands)
                    request->viewer);
     arguments.text({"--public", kUrl, "Address under which clients reach the server"},
                    request->publicAddress);
+    arguments.flag("--stow", request->stow, "Take objects that clients send (STOW-RS)");
     arguments.texts({"--host", "NAME", "Further name by which the server may be asked; may be repeated"},
                     request->hosts);
 }

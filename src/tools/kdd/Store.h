@@ -25,6 +25,9 @@ bool readStudyFile(const QByteArray& studyUID, TagFile& file);
 /// The same for a tag file that is named by its path, whatever study it holds.
 bool readTagFile(const QString& path, TagFile& file);
 
+/// Where the files of objects are that arrive over a network.
+QByteArray objectFolder(const GlobalOptions& options);
+
 /// What the archive keeps itself and must not take in: tag files, volume files, the database.
 QList<QByteArray> ownPlaces(const GlobalOptions& options);
 
