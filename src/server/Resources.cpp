@@ -8,6 +8,7 @@
 #include "server/dicomweb/retrieve/InstancesResource.h"
 #include "server/dicomweb/search/ChangeFeed.h"
 #include "server/dicomweb/search/SearchResource.h"
+#include "server/dicomweb/store/StoreResource.h"
 #include "server/dicomweb/uri/UriResource.h"
 
 #include <kddlib/ExResource.h>
@@ -47,6 +48,8 @@ std::vector<std::unique_ptr<DicomWeb::Resource>> makeResources(ServedArchive& ar
     resources.push_back(std::make_unique<ThumbnailResource>(archive.studies, archive.objects));
     resources.push_back(std::make_unique<RenderedResource>(archive.studies, archive.objects));
     resources.push_back(std::make_unique<UriResource>(archive.studies, archive.objects));
+    if (archive.arrivals != nullptr)
+        resources.push_back(std::make_unique<StoreResource>(*archive.arrivals, archive.storeLimits));
     return resources;
 }
 

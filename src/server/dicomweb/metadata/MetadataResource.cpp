@@ -74,6 +74,8 @@ Http::Response MetadataResource::answer(const Http::Request& request, const Reso
     if (!metadata.read(request, path, status, reason))
         return Http::failure(status, reason);
 
+    if (mStudies.arrivals() != nullptr)
+        mStudies.arrivals()->bringInOwn(path.study);
     // The version alone answers whoever has the answer already or gets one that is kept: both exist only of what was
     // there in this version.
     QByteArray version;
