@@ -43,27 +43,41 @@ struct Candidate
     bool isDecoded = false;  // plain bytes, stored so or decoded
 };
 
-/// How closely the range of types, whose transfer syntax may be named as well, fits the candidate; 0: not at all.
+// Whether the range of types, whose transfer syntax may be named as well, takes a candidate.
+
+bool takesPlain(const QByteArray& type, const QByteArray& syntax, const Candidate& candidate)
+{
+    const bool isSyntax =
+        syntax.isEmpty() || syntax == kExplicitLittleEndian || (syntax == "*" && candidate.isStored);
+    return isSyntax && covers(type, candidate.mediaType);
+}
+
+bool takesEncoded(const QByteArray& type, const QByteArray& syntax, const Candidate& candidate)
+{
+    if (type == kOctetStream)
+        return syntax == candidate.syntax;
+    return type == candidate.mediaType &&
+           (syntax.isEmpty() ? isUsual(candidate.syntax) : syntax == candidate.syntax);
+}
+
+/// Whoever takes any transfer syntax takes it under its own name, also where it asks for plain bytes: viewers do.
+bool takesStored(const QByteArray& type, const QByteArray& syntax, const Candidate& candidate)
+{
+    if (syntax.isEmpty())
+        return isAnything(type) || (names(type, candidate.mediaType) && candidate.mediaType != kOctetStream);
+    return (syntax == "*" || syntax == candidate.syntax) &&
+           (covers(type, candidate.mediaType) || type == kOctetStream);
+}
+
+/// How closely it fits, the syntax considered; 0: not at all.
 int fitOf(const QByteArray& type, const QByteArray& syntax, const Candidate& candidate)
 {
-    const bool isOctets = type == kOctetStream;
-    const int named = syntax.isEmpty() ? 0 : syntax == "*" ? 1 : 2;
-    if (candidate.isDecoded) {
-        const bool takesPlain = syntax.isEmpty() || syntax == kExplicitLittleEndian;
-        return (takesPlain || (syntax == "*" && candidate.isStored)) && covers(type, kOctetStream) ? 1 + named
-                                                                                                   : 0;
-    }
-    if (!candidate.isStored) {
-        const bool isMeant = type == candidate.mediaType &&
-                             (syntax.isEmpty() ? isUsual(candidate.syntax) : syntax == candidate.syntax);
-        return isMeant || (isOctets && syntax == candidate.syntax) ? 1 + named : 0;
-    }
-    // Whoever takes any transfer syntax takes it under its own name, also where it asks for plain bytes: viewers do.
-    const bool isNamed = names(type, candidate.mediaType) && candidate.mediaType != kOctetStream;
-    const bool takesStored =
-        syntax == "*" || syntax == candidate.syntax || (syntax.isEmpty() && (isNamed || isAnything(type)));
-    const bool isType = covers(type, candidate.mediaType) || (isOctets && !syntax.isEmpty());
-    return takesStored && isType ? 1 + named : 0;
+    const auto takes = candidate.isDecoded ? takesPlain : candidate.isStored ? takesStored : takesEncoded;
+    if (!takes(type, syntax, candidate))
+        return 0;
+    if (syntax.isEmpty())
+        return 1;
+    return syntax == "*" ? 2 : 3;
 }
 
 /// How welcome the candidate is, alone or as a part: as the range says that fits it most closely [thousandths].

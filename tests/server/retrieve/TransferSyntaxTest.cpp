@@ -97,7 +97,7 @@ TEST_F(TransferSyntaxTest, OfFramesIsThatOfTheObject)
     }
 }
 
-TEST_F(TransferSyntaxTest, OfParametersLeavesNothingOut)
+TEST_F(TransferSyntaxTest, OfASeriesIsThatOfWhatCanHaveIt)
 {
     add("a.dcm", anImageWithFrames(1));
     add("b.dcm", anImage("1.2.3.2"));
