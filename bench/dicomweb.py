@@ -170,8 +170,8 @@ def start_peer(folder, files):
     config = os.path.join(folder, "peer.json")
     with open(config, "w") as file:
         json.dump({"StorageDirectory": os.path.join(folder, "peer"), "IndexDirectory": os.path.join(folder, "peer"),
-                   "HttpPort": port, "DicomServerEnabled": False, "RemoteAccessAllowed": False, "Plugins": [PLUGIN]},
-                  file)
+                   "HttpPort": port, "DicomServerEnabled": False, "RemoteAccessAllowed": False,
+                   "KeepAlive": True, "Plugins": [PLUGIN]}, file)
     peer = Server("Orthanc", ["Orthanc", config], port)
     link = http.client.HTTPConnection("127.0.0.1", port)
     for place, _, names in os.walk(files):
@@ -186,8 +186,13 @@ def start_peer(folder, files):
 
 
 def ask(link, server, path, headers):
-    link.request("GET", server.prefix + path, headers=headers)
-    answer = link.getresponse()
+    try:
+        link.request("GET", server.prefix + path, headers=headers)
+        answer = link.getresponse()
+    except (http.client.RemoteDisconnected, BrokenPipeError):  # a connection that was kept too long
+        link.close()
+        link.request("GET", server.prefix + path, headers=headers)
+        answer = link.getresponse()
     body = answer.read()
     if answer.status != 200:
         raise RuntimeError("%s answers %s with %d" % (server.name, path, answer.status))
