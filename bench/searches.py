@@ -4,8 +4,8 @@
     bench/searches.py BUILD-FOLDER [REQUESTS] [FOLDER]
 
 For each question the processor's time of the server and of the database's processes, and the time until the answer was
-there [ms]. A FOLDER is kept, so that a repeat need not fill the databases again. KDD_BENCH_PLANS=1 prints before how each
-engine goes about it.
+there [ms]. A FOLDER is kept, so that a repeat need not fill the databases again. With KDD_BENCH_PLANS=1 is told how each
+engine goes about it: SQLite's plans are printed, PostgreSQL's stand in postgres.log of the folder.
 """
 
 import glob
@@ -49,7 +49,9 @@ QUESTIONS = [
 START_POSTGRES = r"""set -- /usr/lib/postgresql/*/bin
 if [ $(id -u) = 0 ]; then chown -R nobody . && S="--reuid nobody --regid nogroup --clear-groups"; fi
 [ -d data ] || setpriv $S $1/initdb -D data -U kdd -A trust -E UTF8 --no-sync >/dev/null
-exec setpriv --pdeathsig QUIT $S $1/postgres -D data -k $PWD -c listen_addresses= -c fsync=off"""
+exec setpriv --pdeathsig QUIT $S $1/postgres -D data -k $PWD -c listen_addresses= -c fsync=off $PLANS"""
+
+PLANS = "-c session_preload_libraries=auto_explain -c auto_explain.log_min_duration=0 -c auto_explain.log_analyze=on"
 
 
 def spent(pid):
@@ -112,12 +114,13 @@ def main():
     os.makedirs(folder + "/store/meta", exist_ok=True)
     os.makedirs(folder + "/postgres", exist_ok=True)
     os.chmod(folder, 0o755)
-    postgres = subprocess.Popen(["sh", "-c", START_POSTGRES], cwd=folder + "/postgres", stderr=subprocess.PIPE,
-                                text=True)
+    log = folder + "/postgres.log"
+    postgres = subprocess.Popen(["sh", "-c", START_POSTGRES], cwd=folder + "/postgres", stderr=open(log, "w"),
+                                env=dict(os.environ, PLANS=PLANS if "KDD_BENCH_PLANS" in os.environ else ""))
     try:
-        for line in postgres.stderr:
-            if "ready to accept connections" in line:
-                break
+        while "ready to accept connections" not in open(log).read():
+            assert postgres.poll() is None, open(log).read()
+            time.sleep(0.1)
         where = "host=" + folder + "/postgres"
         subprocess.run(["psql", "-q", "-c", "CREATE DATABASE kdd", f"postgresql://kdd@/postgres?{where}"],
                        stderr=subprocess.DEVNULL, check=False)

@@ -26,6 +26,10 @@ bool makePostgresIndex(SqlConnection& connection)
                                .arg(columns.join(QStringLiteral(", "))));
         connection.execute(QStringLiteral(
             "CREATE INDEX study_search_parts ON study_search USING gin (name_words gin_trgm_ops)"));
+        // The server guesses from a sample of names how many have a part. From the usual one it takes a part that one in
+        // a hundred has for three times as frequent, and walks the list where the index finds them in a third of the time.
+        connection.execute(
+            QStringLiteral("ALTER TABLE study_search ALTER COLUMN name_words SET STATISTICS 1000"));
         connection.execute(QStringLiteral("RELEASE SAVEPOINT words_index"));
         return true;
     } catch (const DatabaseError& error) {

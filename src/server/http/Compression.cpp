@@ -20,7 +20,7 @@ bool isWorthCompressing(const Request& request, qint64 size)
 
 void compress(const Request& request, Response& response)
 {
-    auto* const body = response.body.size() == 1 ? std::get_if<QByteArray>(&response.body[0]) : nullptr;
+    auto* const body = response.body.size() == 1 ? std::get_if<QByteArray>(&response.body.front()) : nullptr;
     if (body == nullptr)
         return;
     response.addHeader("Vary", "Accept-Encoding");
