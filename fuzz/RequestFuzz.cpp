@@ -53,10 +53,29 @@ QByteArray requestsIn(const QByteArray& bytes, int piece)
 {
     Http::RequestReader reader(kLimits);
     QByteArray text;
+    QByteArray body;
     auto state = Http::RequestReader::State::Between;
     for (int at = 0; at < bytes.size() && state != Http::RequestReader::State::Refused; at += piece) {
         reader.add(bytes.constData() + at, std::min(piece, bytes.size() - at));
-        while ((state = reader.advance()) == Http::RequestReader::State::Whole) {
+        for (bool goesOn = true; goesOn;) {
+            if (state == Http::RequestReader::State::Headed) {
+                char block[100];
+                int count = 0;
+                const auto read = reader.readBody(block, sizeof block, count);
+                if (read == Http::RequestReader::Body::Malformed)
+                    return text + "malformed";
+                body.append(block, count);
+                goesOn = read != Http::RequestReader::Body::Awaited;
+                if (read != Http::RequestReader::Body::End)
+                    continue;
+                text += body + '\n';
+                body.clear();
+            }
+            state = reader.advance();
+            goesOn =
+                state == Http::RequestReader::State::Whole || state == Http::RequestReader::State::Headed;
+            if (!goesOn)
+                break;
             const Http::Request request = reader.take();
             text += request.target + ' ' + reader.host() + '\n';
             for (const Http::Field& field : request.headers)
