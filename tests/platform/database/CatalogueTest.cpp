@@ -215,6 +215,27 @@ TEST_P(CatalogueTest, FindsStudiesByTheBeginningOfTheirUID)
     EXPECT_EQ(findStudies("1", 3).size(), 3);
 }
 
+TEST_P(CatalogueTest, FilesOfAnImageAreFoundByWhatTheySayThemselves)
+{
+    add({dicom("/d/a", "1", "1.1", "x"), dicom("/d/b", "1", "1.1", "y"), dicom("/e/a", "9", "9.1", "x")});
+    add({dicom("/d/c", "1", "1.1", "x")});
+    const auto files = [&](const char* image) {
+        QVector<KeptFile> found;
+        EXPECT_TRUE(catalogue().imageFiles("1", image, found).good());
+        std::string text;
+        for (const KeptFile& file : found)
+            text += (file.path + (file.isShown ? " shown " : " ") + file.shownStudyUID + ' ' +
+                     file.shownSeriesUID + ' ' + file.shownImage + '\n')
+                        .toStdString();
+        return text;
+    };
+    EXPECT_EQ(files("x"), "/d/c shown 1 1.1 x\n/d/a 1 1.1 x\n");
+    correct({{"1", "x", "2", "2.1", "x2", "changes"}, {"1", "y", "1", "1.1", "x", "changes"}});
+    EXPECT_EQ(files("x"), "/d/c shown 2 2.1 x2\n/d/a 2 2.1 x2\n") << "not what is shown as x now";
+    EXPECT_EQ(files("y"), "/d/b shown 1 1.1 x\n");
+    EXPECT_EQ(files("z"), "");
+}
+
 TEST_P(CatalogueTest, ConfigurationIsReadBack)
 {
     catalogue();

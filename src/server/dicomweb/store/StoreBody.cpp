@@ -140,11 +140,12 @@ Http::Response StoreBody::answer()
     mObject.reset();
     if (mParts && !mParts->isComplete() && badStatus == 0)
         badStatus = 400;
-    if (mParts && mReport.stored() + mReport.failed() == 0)
-        return Http::failure(badStatus == 0 ? 400 : badStatus,
-                             mParts->fault().isEmpty()
-                                 ? QStringLiteral("The body has no part that came whole")
-                                 : mParts->fault());
+    if (mParts && mReport.stored() + mReport.failed() == 0) {
+        const QString reason = mParts->fault().isEmpty()
+                                   ? QStringLiteral("The body has no part that came whole")
+                                   : mParts->fault();
+        return Http::failure(badStatus == 0 ? 400 : badStatus, reason);
+    }
     return mReport.response(mOrder.form, badStatus);
 }
 

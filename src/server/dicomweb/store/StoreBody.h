@@ -28,7 +28,7 @@ struct StoreOrder
 
 /// Stores the objects of one request as they come, some at a time as soon as they are whole: what a request that breaks off
 /// has brought by then stays.
-class StoreBody : public Http::BodySink, private Http::MultipartReader::Receiver
+class StoreBody final : public Http::BodySink, private Http::MultipartReader::Receiver
 {
 public:
     /// `arrivals` outlives the object; `ended` is called with its end.
