@@ -1,6 +1,7 @@
 // What clients send: their requests, and the addresses in them.
 
 #include "fuzz/Property.h"
+#include "server/dicomweb/uri/UriRequest.h"
 #include "server/http/RequestReader.h"
 #include "server/http/RequestTarget.h"
 
@@ -48,6 +49,33 @@ void checkTarget(const QByteArray& target)
             "and gives the same parts");
 }
 
+/// What is taken of parameters lies within bounds.
+void checkParameters(const QByteArray& target)
+{
+    Http::RequestTarget parsed;
+    Http::Request request;
+    DicomWeb::UriRequest wanted;
+    if (!Http::RequestTarget::parse(target, parsed))
+        return;
+    request.query = parsed.query;
+    // The others are looked at only when these are right.
+    for (const char* uid : {"studyUID", "seriesUID", "objectUID"})
+        request.query.prepend({uid, "1.2"});
+    request.query.prepend({"requestType", "WADO"});
+    if (DicomWeb::UriRequest::parse(request, wanted).bad())
+        return;
+    const DicomWeb::RenderRequest& rendering = wanted.rendering;
+    const DicomWeb::SourceRegion& region = rendering.region;
+    require(rendering.viewport.width() <= DicomWeb::kLongestSide &&
+                rendering.viewport.height() <= DicomWeb::kLongestSide,
+            "a picture is not too large");
+    require(region.x >= 0 && region.y >= 0 && region.x + region.width < 1.000001 &&
+                region.y + region.height < 1.000001,
+            "a region lies within the picture");
+    require(!rendering.window || rendering.window->width >= 1, "a window has a width");
+    require(rendering.quality >= 1 && rendering.quality <= 100, "a quality is one");
+}
+
 /// What is made of the bytes when they come in pieces of a size.
 QByteArray requestsIn(const QByteArray& bytes, int piece)
 {
@@ -73,6 +101,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size)
     const QByteArray bytes(reinterpret_cast<const char*>(data),
                            static_cast<int>(std::min<size_t>(size, 20000)));
     checkTarget(bytes.left(bytes.indexOf('\n')));
+    checkParameters("/wado?" + bytes.left(bytes.indexOf('\n')));
     const QByteArray whole = requestsIn(bytes, bytes.size() + 1);
     if (bytes.size() < 2000)
         require(requestsIn(bytes, 7) == whole, "it does not matter in which pieces a request comes");

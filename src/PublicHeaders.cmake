@@ -4,10 +4,12 @@ set(KDD_PUBLIC_HEADERS
   core/kddlib/Loader.h
   core/kddlib/TagFileGenerator.h
   core/kddlib/archive/ArchiveDatabase.h
+  core/kddlib/archive/ArrivedStudies.h
   core/kddlib/archive/CorrectedDataset.h
   core/kddlib/archive/DicomInput.h
   core/kddlib/archive/FileScan.h
   core/kddlib/archive/FileWalk.h
+  core/kddlib/archive/ObjectStore.h
   core/kddlib/archive/Registration.h
   core/kddlib/archive/StudyBuilders.h
   core/kddlib/archive/StudyChange.h

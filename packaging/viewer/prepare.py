@@ -19,7 +19,10 @@ OWN = os.path.dirname(os.path.abspath(__file__))
 # Where the page names its files, where its program does, its style sheets do, and what a browser is told of its icons.
 ROOTS = {
     ".html": [(r'((?:src|href|content)="|PUBLIC_URL = \')/(?!/)', r"\1/viewer/")],
-    ".js": [(r'(__webpack_require__\.p = ")/"', r'\1/viewer/"')],
+    ".js": [
+        (r'(__webpack_require__\.p = ")/"', r'\1/viewer/"'),
+        (r"(browserImportFunction\(['\"])/(?!/)", r"\1/viewer/"),
+    ],
     ".json": [(r'("(?:src|start_url|scope)": ?")/(?!/)', r"\1/viewer/")],
     ".css": [(r"(url\(['\"]?)/(?!/)", r"\1/viewer/")],
 }

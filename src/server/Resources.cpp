@@ -8,6 +8,7 @@
 #include "server/dicomweb/retrieve/InstancesResource.h"
 #include "server/dicomweb/search/ChangeFeed.h"
 #include "server/dicomweb/search/SearchResource.h"
+#include "server/dicomweb/store/StoreResource.h"
 #include "server/dicomweb/uri/UriResource.h"
 
 #include <kddlib/ExResource.h>
@@ -27,15 +28,19 @@ QString answersFolder()
 
 }  // namespace
 
-std::vector<std::unique_ptr<DicomWeb::Resource>> makeResources(ServedArchive& archive)
+std::vector<std::unique_ptr<DicomWeb::Resource>> makeResources(ServedArchive& archive, Http::Metrics& metrics)
 {
     using namespace DicomWeb;
 
     std::vector<std::unique_ptr<Resource>> resources;
     // Viewers ask for frames nine times of ten.
     resources.push_back(std::make_unique<FramesResource>(archive.studies, archive.objects));
-    resources.push_back(std::make_unique<MetadataResource>(*archive.studies, answersFolder(),
-                                                           qint64(ExResource::answersSize()) * 1024 * 1024));
+    auto metadata = std::make_unique<MetadataResource>(*archive.studies, answersFolder(),
+                                                       qint64(ExResource::answersSize()) * 1024 * 1024);
+    metrics.addCache("studies", archive.studies->count());
+    metrics.addCache("objects", archive.objects->count());
+    metrics.addCache("answers", metadata->keptCount());
+    resources.push_back(std::move(metadata));
     resources.push_back(std::make_unique<SearchResource>(archive.database, *archive.studies));
     resources.push_back(std::make_unique<ChangeFeed>(archive.database));
     resources.push_back(std::make_unique<InstancesResource>(archive.studies, archive.objects));
@@ -43,6 +48,8 @@ std::vector<std::unique_ptr<DicomWeb::Resource>> makeResources(ServedArchive& ar
     resources.push_back(std::make_unique<ThumbnailResource>(archive.studies, archive.objects));
     resources.push_back(std::make_unique<RenderedResource>(archive.studies, archive.objects));
     resources.push_back(std::make_unique<UriResource>(archive.studies, archive.objects));
+    if (archive.arrivals != nullptr)
+        resources.push_back(std::make_unique<StoreResource>(*archive.arrivals, archive.storeLimits));
     return resources;
 }
 

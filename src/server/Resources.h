@@ -4,6 +4,8 @@
 #include "server/dicomweb/StudyShelf.h"
 #include "server/dicomweb/retrieve/ObjectShelf.h"
 #include "server/dicomweb/search/ThreadSearch.h"
+#include "server/dicomweb/store/StoreBody.h"
+#include "server/http/Metrics.h"
 
 #include <kddlib/Kxg.h>
 
@@ -20,11 +22,14 @@ struct ServedArchive
     std::shared_ptr<DicomWeb::StudyShelf> studies = std::make_shared<DicomWeb::StudyShelf>(qint64(64) << 20);
     std::shared_ptr<DicomWeb::ObjectShelf> objects = std::make_shared<DicomWeb::ObjectShelf>(32 << 20);
     DicomWeb::ThreadSearch database{Kxg::DatabaseServer()};
+    std::unique_ptr<DicomWeb::ArrivalService> arrivals;  ///< null where no objects are taken
+    DicomWeb::StoreLimits storeLimits;
 };
 
 /// All that answers below the prefix of DICOMweb, in the order in which they are asked whether a path is theirs. The
-/// archive outlives them.
-std::vector<std::unique_ptr<DicomWeb::Resource>> makeResources(ServedArchive& archive);
+/// archive outlives them, and `metrics`, which is told of what is kept ready, is asked for nothing once they are gone.
+std::vector<std::unique_ptr<DicomWeb::Resource>> makeResources(ServedArchive& archive,
+                                                               Http::Metrics& metrics);
 
 /// What answers beside that prefix, under the one path that older viewers know.
 std::vector<std::unique_ptr<DicomWeb::Resource>> makeUriResources(ServedArchive& archive);

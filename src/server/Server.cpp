@@ -151,7 +151,7 @@ public:
 
 struct Server::Private
 {
-    explicit Private(const ServerSettings& settings)
+    Private(const ServerSettings& settings, std::unique_ptr<DicomWeb::ArrivalService> arrivals)
         : prefix(Router::segmentsOf(settings.prefix))
         , log(metrics, prefix, settings.slow)
         , trail(makeTrail(settings, prefix))
@@ -162,8 +162,12 @@ struct Server::Private
         , statusGuard(settings.addresses, statusPages)
         , http(settings.http, guard, observers)
     {
-        router.add(prefix,
-                   std::make_unique<DicomWeb::DicomWebService>(prefix.size(), makeResources(archive)));
+        stopTime = settings.http.stop;
+        archive.arrivals = std::move(arrivals);
+        archive.storeLimits = settings.store;
+        archive.studies->setArrivals(archive.arrivals.get());
+        router.add(prefix, std::make_unique<DicomWeb::DicomWebService>(prefix.size(),
+                                                                       makeResources(archive, metrics)));
         router.add(Router::segmentsOf(kUriPath),
                    std::make_unique<DicomWeb::DicomWebService>(0, makeUriResources(archive)));
         Browser::BrowserSettings browser;
@@ -180,6 +184,7 @@ struct Server::Private
     }
 
     QVector<QByteArray> prefix;
+    std::chrono::milliseconds stopTime;
     ServedArchive archive;
     Http::Metrics metrics;
     RequestLog log;
@@ -205,6 +210,9 @@ std::unique_ptr<Server> Server::make(ServerSettings settings, Result& result)
     const QVector<QByteArray> viewerPath = Router::segmentsOf(kViewerPath);
     if (result.good() && !settings.viewer.isEmpty())
         viewer = ViewerFiles::open(settings.viewer, viewerPath.size(), result);
+    std::unique_ptr<DicomWeb::ArrivalService> arrivals;
+    if (result.good() && settings.objects)
+        arrivals = DicomWeb::ArrivalService::make(*settings.objects, Kxg::DatabaseServer(), result);
     if (result.bad())
         return nullptr;
     settings.http.connections = affordableConnections(settings.http.connections);
@@ -212,7 +220,7 @@ std::unique_ptr<Server> Server::make(ServerSettings settings, Result& result)
         settings.access = Access::AccessRules::open();
     if (settings.access->certificates)
         settings.http.clientCaFile = settings.access->certificates->caFile;
-    auto made = std::make_unique<Private>(settings);
+    auto made = std::make_unique<Private>(settings, std::move(arrivals));
     if (made->trail != nullptr)
         result = made->trail->check();
     if (result.bad())
@@ -236,6 +244,8 @@ Result Server::start()
         result = d->status->start();
     if (result.bad())
         stop();
+    else if (d->archive.arrivals != nullptr)
+        d->archive.arrivals->start();
     return result;
 }
 
@@ -248,6 +258,8 @@ Result Server::renewCertificate()
 void Server::stop()
 {
     d->http.stop();
+    if (d->archive.arrivals != nullptr)
+        d->archive.arrivals->stop(d->stopTime);
     if (d->status != nullptr)
         d->status->stop();
 }

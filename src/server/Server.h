@@ -2,6 +2,7 @@
 
 #include "server/access/AccessRules.h"
 #include "server/access/AddressGuard.h"
+#include "server/dicomweb/store/StoreBody.h"
 #include "server/http/HttpSettings.h"
 
 #include <QString>
@@ -21,8 +22,10 @@ struct ServerSettings
     Access::AddressRules addresses;
     std::optional<Access::AccessRules>
         access;  ///< without them everybody may do everything, and only this machine reaches the server
-    QByteArray prefix = "/dicom-web";      ///< of the paths of DICOMweb
-    QString viewer;                        ///< folder of a viewer's files, served under /viewer; empty: none
+    QByteArray prefix = "/dicom-web";    ///< of the paths of DICOMweb
+    QString viewer;                      ///< folder of a viewer's files, served under /viewer; empty: none
+    std::optional<ObjectRules> objects;  ///< that are taken; without it none are
+    DicomWeb::StoreLimits store;
     std::chrono::milliseconds slow{2000};  ///< requests that take longer are told in the log
 };
 

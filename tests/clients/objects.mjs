@@ -57,7 +57,7 @@ const object = (kind, modality, study, series, instance) => ({
   '00080005': ['CS', 'ISO_IR 192'], '00080016': ['UI', classOf(kind)], '00080018': ['UI', `${kRoot}.${study}.${series}.${instance}`],
   '00080020': ['DA', '20260301'], '00080021': ['DA', '20260301'], '00080030': ['TM', '101500'], '00080050': ['SH', `ACC-${study}`],
   '00080060': ['CS', modality], '00081030': ['LO', `Trial of ${modality}`], '0008103E': ['LO', `${modality} ${series}`],
-  '00100010': ['PN', `Viewer^${kind}=${kind === 'PT' ? '観察' : '山田'}^太郎`], '00100020': ['LO', `VIEWER-${kind}`], '0020000D': ['UI', `${kRoot}.${study}`],
+  '00100010': ['PN', `Viewer^${kind}=山田^太郎`], '00100020': ['LO', `VIEWER-${kind}`], '0020000D': ['UI', `${kRoot}.${study}`],
   '0020000E': ['UI', `${kRoot}.${study}.${series}`], '00200011': ['IS', series], '00200013': ['IS', instance],
 });
 

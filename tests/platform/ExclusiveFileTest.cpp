@@ -7,6 +7,7 @@
 #include <QFile>
 
 #include <gtest/gtest.h>
+#include <sys/stat.h>
 
 #include <random>
 
@@ -57,6 +58,14 @@ TEST_F(ExclusiveFileTest, OnlyReadersGoTogetherAndDeathFreesTheFile)
     }
     QFile second;  // of the same process
     EXPECT_EQ(open(second, FileLock::Shared), OpenFailure::Locked);
+}
+
+TEST_F(ExclusiveFileTest, APipeIsRefusedAndNotWaitedFor)
+{
+    ASSERT_EQ(::mkfifo(path().toLocal8Bit().constData(), 0600), 0);
+    QFile file;
+    for (const FileLock lock : {FileLock::Shared, FileLock::Exclusive})
+        EXPECT_EQ(open(file, lock), OpenFailure::System);
 }
 
 TEST_F(ExclusiveFileTest, NoCountIsLostWhileOthersDelete)

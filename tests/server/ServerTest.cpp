@@ -93,6 +93,17 @@ TEST_F(ServerTest, TellsWhetherItIsReady)
     EXPECT_EQ(get(server->statusAddress(), "/readyz").status, 503);
 }
 
+TEST_F(ServerTest, KnowsOlderViewersBesideThePrefixAndBelow)
+{
+    const auto server = started();
+    for (const QByteArray path : {"/wado", "/dicom-web/wado"}) {
+        const Reply reply = get(server->address(), path + "?requestType=WADO");
+        EXPECT_EQ(reply.status, 400);
+        EXPECT_EQ(reply.body, "The parameter studyUID has to be a UID\n");
+        EXPECT_EQ(get(server->address(), path + "/1.2").status, 404);
+    }
+}
+
 TEST_F(ServerTest, CountsRequestsByGroupsOfItsOwn)
 {
     const auto server = started();
@@ -110,6 +121,7 @@ TEST_F(ServerTest, CountsRequestsByGroupsOfItsOwn)
     EXPECT_TRUE(text.contains("kdd_http_request_duration_seconds_count{route=\"metadata\"} 1\n"));
     EXPECT_TRUE(text.contains("kdd_http_request_duration_seconds_bucket{route=\"other\",le=\"+Inf\"} 4\n"));
     EXPECT_TRUE(text.contains("kdd_http_request_duration_seconds_count{route=\"other\"} 4\n"));
+    EXPECT_TRUE(text.contains("\nkdd_cache_misses_total{cache=\"studies\"} 0\n"));
     EXPECT_TRUE(text.contains("\n# TYPE kdd_http_connections gauge\nkdd_http_connections "));
     EXPECT_FALSE(text.contains("Doe") || text.contains("madeup"));
 }

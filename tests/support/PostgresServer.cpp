@@ -22,13 +22,18 @@ constexpr int kPatience = 60000;  // [ms]
 constexpr char kStart[] =
     R"(set -- /usr/lib/postgresql/*/bin
 if [ $(id -u) = 0 ]; then chown nobody . && S="--reuid nobody --regid nogroup --clear-groups"; fi
-exec setpriv --pdeathsig QUIT $S sh -c "$1/initdb -D data -U kdd -A trust -E UTF8 --no-sync --locale=C.UTF-8 \
---locale-provider=icu --icu-locale=en-US && exec $1/postgres -D data -k $PWD -c listen_addresses= -c fsync=off \
+exec setpriv --pdeathsig QUIT $S sh -c "[ -d data ] || $1/initdb -D data -U kdd -A trust -E UTF8 --no-sync \
+--locale=C.UTF-8 --locale-provider=icu --icu-locale=en-US && exec $1/postgres -D data -k $PWD -c listen_addresses= -c fsync=off \
 -c log_min_messages=log")";
 
 struct Server
 {
-    Server()
+    Server() { start(); }
+    ~Server() { stop(); }
+    Server(const Server&) = delete;
+    Server& operator=(const Server&) = delete;
+
+    void start()
     {
         program.setWorkingDirectory(folder.path());
         program.setProcessChannelMode(QProcess::MergedChannels);
@@ -40,13 +45,12 @@ struct Server
             said += program.readAll();
         }
     }
-    ~Server()
+
+    void stop()
     {
         ::kill(static_cast<pid_t>(program.processId()), SIGINT);  // ends the connections, too
         program.waitForFinished(kPatience);
     }
-    Server(const Server&) = delete;
-    Server& operator=(const Server&) = delete;
 
     QTemporaryDir folder{QDir::tempPath() + QStringLiteral("/kddpg")};
     QProcess program;
@@ -82,6 +86,16 @@ QByteArray newPostgresDatabase()
     const QByteArray name = "test" + QByteArray::number(++server().databases);
     runOnPostgres("CREATE DATABASE " + name);
     return postgresAddress(name);
+}
+
+void stopPostgres()
+{
+    server().stop();
+}
+
+void startPostgres()
+{
+    server().start();
 }
 
 void runOnPostgres(const QByteArray& sql)

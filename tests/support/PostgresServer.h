@@ -15,6 +15,10 @@ QByteArray newPostgresDatabase();
 /// The address of a database on the server, which need not be there.
 QByteArray postgresAddress(const QByteArray& database);
 
+// It can be away for a time, with its data kept. Its connections are gone then.
+void stopPostgres();
+void startPostgres();
+
 /// Runs a statement over a connection of its own.
 void runOnPostgres(const QByteArray& sql);
 

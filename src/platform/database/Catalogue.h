@@ -138,6 +138,16 @@ struct ListedImage
     const QByteArray& key() const { return sopInstanceUID.isEmpty() ? path : sopInstanceUID; }
 };
 
+/// A file of an image, where the image is shown now.
+struct KeptFile
+{
+    QByteArray path;
+    bool isShown = false;  ///< of several files the one that counts
+    QByteArray shownStudyUID;
+    QByteArray shownSeriesUID;
+    QByteArray shownImage;
+};
+
 /// All that the catalogue has of one study.
 struct StudyContents
 {
@@ -337,6 +347,13 @@ public:
 
     virtual Kdd::Result setConfig(const QByteArray& section, const QByteArray& key,
                                   const QByteArray& value) = 0;
+
+    // ---- single images
+
+    /// The files of an image by the UIDs that these have themselves, wherever a correction has put it; the one
+    /// registered last comes first.
+    virtual Kdd::Result imageFiles(const QByteArray& studyUID, const QByteArray& sopUID,
+                                   QVector<KeptFile>& files) = 0;
 
 protected:
     Catalogue() = default;

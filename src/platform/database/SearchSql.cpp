@@ -13,6 +13,14 @@ namespace
 /// The engine's index of parts finds what has at least so many characters.
 constexpr int kIndexedPart = 3;
 
+/// From so many on, of however many studies, it takes less time to walk the list than to find and sort all that have a
+/// part of a text.
+constexpr int kFrequent = 2000;
+
+// Of so many studies that is the part which the newest ones are held against.
+constexpr int kArchive = 100000;
+constexpr int kSample = 4000;
+
 /// The longest piece between two stars.
 QByteArray longestPart(const QByteArray& pattern)
 {
@@ -292,7 +300,7 @@ SearchSql seriesFrom(const SqlDialect& dialect, const SearchQuery& query)
 void addPage(SearchSql& sql, const SearchQuery& query)
 {
     sql.text += " LIMIT ? OFFSET ?";
-    sql.values << std::max(0, query.limit) << std::max(0, query.offset);
+    sql.values << std::max(0, query.limit) + std::max(0, query.counted) << std::max(0, query.offset);
 }
 
 SearchSql counted(const SearchSql& from, int most)
@@ -305,15 +313,23 @@ SearchSql counted(const SearchSql& from, int most)
 
 }  // namespace
 
-SearchSql countPartsSql(const SqlDialect& dialect, const SearchTerm& term, const QByteArray& pattern,
-                        int most)
+SearchSql isFrequentSql(const SqlDialect& dialect, const SearchTerm& term, const QByteArray& pattern)
 {
     const char* const column = columnOf(term.column).words;
     const QByteArray part = longestPart(pattern);
-    if (!dialect.hasMatchIndex || column == nullptr || part.size() < kIndexedPart)
+    if (!dialect.hasMatchIndex || column == nullptr)
         return {};
-    return {"SELECT COUNT(*) FROM (SELECT 1 FROM study_parts WHERE study_parts MATCH ? LIMIT ?) counted",
-            {textValue(phrase(column, part)), most}};
+    if (part.size() >= kIndexedPart)
+        return {
+            "SELECT COUNT(*) >= ? FROM (SELECT 1 FROM study_parts WHERE study_parts MATCH ? LIMIT ?) counted",
+            {kFrequent, textValue(phrase(column, part)), kFrequent}};
+    // The index does not know it, and all texts would be looked through: the newest tell how frequent it is.
+    if (term.column != SearchColumn::PatientName)
+        return {};
+    return {"SELECT COUNT(*) >= ? FROM (SELECT name_words FROM study_search"
+            " ORDER BY study_date DESC, study_time DESC, uid LIMIT ?) newest WHERE " +
+                dialect.wordsOf.arg(QLatin1String("name_words")).toLatin1(),
+            {kFrequent * kSample / kArchive, kSample, textValue(dialect.pattern(pattern))}};
 }
 
 SearchSql studiesSql(const SqlDialect& dialect, const SearchQuery& query, const QSet<QByteArray>& frequent)

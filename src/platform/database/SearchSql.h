@@ -16,10 +16,9 @@ struct SearchSql
     QVariantList values;
 };
 
-/// How many texts have what a pattern asks for, counted up to `most`; an empty text when it has no part that the index
-/// knows, or the engine decides by itself.
-SearchSql countPartsSql(const SqlDialect& dialect, const SearchTerm& term, const QByteArray& pattern,
-                        int most);
+/// Whether so many texts have what a pattern asks for that walking the list finds a page sooner than to find all of them;
+/// an empty text when the engine decides by itself.
+SearchSql isFrequentSql(const SqlDialect& dialect, const SearchTerm& term, const QByteArray& pattern);
 
 // Studies: id, uid, is_built, file_size, file_modified, digest, modalities, series, instances, attributes.
 //

@@ -325,4 +325,27 @@ Kdd::Result SqlCatalogue::setConfig(const QByteArray& section, const QByteArray&
     });
 }
 
+// ---- single images
+
+Kdd::Result SqlCatalogue::imageFiles(const QByteArray& studyUID, const QByteArray& sopUID,
+                                     QVector<KeptFile>& files)
+{
+    return transact(Access::Read, [&] {
+        QVector<KeptFile> found;
+        // One that follows a correction is shown under other UIDs; and what is shown under these may be another image.
+        // Two questions, so that each goes by an index.
+        const QByteArray select = "SELECT file.path, file.is_shown, study.uid, series.uid, file.sop_uid,"
+                                  " file.registered FROM file JOIN series ON series.id = file.series_id"
+                                  " JOIN study ON study.id = series.study_id WHERE file.kind = 1 AND ";
+        SqlRows rows = mConnection.ask(
+            select + "file.sop_uid = ? AND study.uid = ? AND file.correction_id IS NULL UNION ALL " + select +
+                "file.correction_id IN (SELECT id FROM correction WHERE study_uid = ? AND image = ?)"
+                " ORDER BY 6 DESC, 1 DESC",
+            {textValue(sopUID), textValue(studyUID), textValue(studyUID), bytesValue(sopUID)});
+        while (rows.next())
+            found.append({rows.bytes(0), rows.truth(1), rows.text(2), rows.text(3), rows.text(4)});
+        files.swap(found);
+    });
+}
+
 }  // namespace Kxg

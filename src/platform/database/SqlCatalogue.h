@@ -40,6 +40,9 @@ public:
 
     Kdd::Result setConfig(const QByteArray& section, const QByteArray& key, const QByteArray& value) override;
 
+    Kdd::Result imageFiles(const QByteArray& studyUID, const QByteArray& sopUID,
+                           QVector<KeptFile>& files) override;
+
 private:
     using Access = SqlConnection::Access;
 

@@ -13,6 +13,8 @@ SqlDialect sqlite()
     dialect.connectOptions = QStringLiteral("QSQLITE_BUSY_TIMEOUT=30000");
     // Without it the engine passes over what tables refer to.
     dialect.afterOpening << QStringLiteral("PRAGMA foreign_keys = ON");
+    // What is registered is told to whoever sent it, and has to be there after a power cut too.
+    dialect.afterOpening << QStringLiteral("PRAGMA synchronous = FULL");
     // Readers and the writer then do not wait for each other.
     dialect.beforeSchema << QStringLiteral("PRAGMA journal_mode = WAL");
     dialect.beginReading << QStringLiteral("BEGIN");
@@ -44,11 +46,15 @@ SqlDialect postgres()
                        "-c tcp_keepalives_count=3'");
     // Notices such as that a table exists already would go to standard error.
     dialect.afterOpening << QStringLiteral("SET client_min_messages = error");
+    // What is registered has to be there after a power cut, whatever the server was set up for.
+    dialect.afterOpening << QStringLiteral("SELECT set_config('synchronous_commit', 'on', false)"
+                                           " WHERE current_setting('synchronous_commit') = 'off'");
     dialect.beginReading << QStringLiteral("BEGIN ISOLATION LEVEL REPEATABLE READ, READ ONLY");
     // One writer at a time, as with the other engine: else a series could be found empty and removed while another
     // transaction adds to it, and two that touch the same studies in different order would block each other.
     dialect.beginWriting
-        << QStringLiteral("BEGIN")
+        // Named, for a server may be set up for another: then a writer would not see what was written while he waited.
+        << QStringLiteral("BEGIN ISOLATION LEVEL READ COMMITTED")
         << QStringLiteral("SELECT pg_advisory_xact_lock(%1, %2)").arg(kAdvisoryLocks).arg(kWriterLock);
     // A function that looks a name up, such as to_regclass, would answer from a cache within a transaction that waited
     // for another one to make the table.

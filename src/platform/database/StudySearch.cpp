@@ -7,6 +7,7 @@
 #include "platform/database/SearchWords.h"
 #include "platform/database/SqlConnection.h"
 
+#include <algorithm>
 #include <utility>
 
 namespace Kxg
@@ -15,10 +16,6 @@ namespace
 {
 
 using Access = SqlConnection::Access;
-
-/// From so many on, of however many studies, it takes less time to walk the list than to find and sort all that have a
-/// part of a text.
-constexpr int kFrequent = 2000;
 
 constexpr int kStudyColumns = 9;
 constexpr int kSortColumns = 8;  // which the engine gives along
@@ -37,6 +34,16 @@ FoundStudy studyOf(const SqlRows& rows, int attributes)
     study.instances = static_cast<int>(rows.number(8));
     study.attributes = rows.bytes(attributes);
     return study;
+}
+
+/// A row of the page is taken by `take`, one behind it counted.
+template <typename Found, typename Take>
+void takeOrCount(std::vector<Found>& found, int limit, int* behind, const Take& take)
+{
+    if (found.size() < static_cast<std::size_t>(std::max(0, limit)))
+        found.push_back(take());
+    else if (behind != nullptr)
+        ++*behind;
 }
 
 }  // namespace
@@ -76,11 +83,11 @@ struct StudySearch::Private
         return transact(Access::Read, [&] {
             for (const SearchTerm& term : query.terms) {
                 for (const QByteArray& pattern : term.patterns) {
-                    const SearchSql sql = countPartsSql(dialect(), term, pattern, kFrequent);
+                    const SearchSql sql = isFrequentSql(dialect(), term, pattern);
                     if (sql.text.isEmpty())
                         continue;
                     SqlRows rows = connection.ask(sql.text, sql.values);
-                    if (rows.next() && rows.number(0) >= kFrequent)
+                    if (rows.next() && rows.truth(0))
                         frequent.insert(pattern);
                 }
             }
@@ -107,25 +114,32 @@ StudySearch::StudySearch(std::unique_ptr<Private> made)
 
 StudySearch::~StudySearch() = default;
 
-Kdd::Result StudySearch::studies(const SearchQuery& query, std::vector<FoundStudy>& found)
+Kdd::Result StudySearch::studies(const SearchQuery& query, std::vector<FoundStudy>& found, int* behind)
 {
     found.clear();
+    if (behind != nullptr)
+        *behind = 0;
     QSet<QByteArray> frequent;
     const Kdd::Result counted = d->findFrequent(query, frequent);
     if (counted.bad())
         return counted;
-    return d->ask(studiesSql(d->dialect(), query, frequent),
-                  [&](const SqlRows& rows) { found.push_back(studyOf(rows, kStudyColumns + kSortColumns)); });
+    return d->ask(studiesSql(d->dialect(), query, frequent), [&](const SqlRows& rows) {
+        takeOrCount(found, query.limit, behind, [&] { return studyOf(rows, kStudyColumns + kSortColumns); });
+    });
 }
 
-Kdd::Result StudySearch::series(const SearchQuery& query, std::vector<FoundSeries>& found)
+Kdd::Result StudySearch::series(const SearchQuery& query, std::vector<FoundSeries>& found, int* behind)
 {
     found.clear();
+    if (behind != nullptr)
+        *behind = 0;
     return d->ask(seriesSql(d->dialect(), query), [&](const SqlRows& rows) {
         // The series' UID and number stand among those that it is sorted by.
         const int attributes = kStudyColumns + kSortColumns + 2;
-        found.push_back({studyOf(rows, attributes), rows.text(kStudyColumns),
-                         static_cast<int>(rows.number(attributes + 1)), rows.bytes(attributes + 2)});
+        takeOrCount(found, query.limit, behind, [&] {
+            return FoundSeries{studyOf(rows, attributes), rows.text(kStudyColumns),
+                               static_cast<int>(rows.number(attributes + 1)), rows.bytes(attributes + 2)};
+        });
     });
 }
 

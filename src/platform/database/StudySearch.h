@@ -62,6 +62,8 @@ struct SearchQuery
     std::vector<SearchOrder> order;  ///< none: newest first
     int offset = 0;
     int limit = 100;
+    int counted =
+        0;  ///< so many behind the page are counted along, which is cheaper than to ask for their number
 };
 
 struct FoundStudy
@@ -116,10 +118,11 @@ public:
     StudySearch(const StudySearch&) = delete;
     StudySearch& operator=(const StudySearch&) = delete;
 
-    Kdd::Result studies(const SearchQuery& query, std::vector<FoundStudy>& found);
+    /// `behind`, where it is not null, is set to how many of the studies behind the page were counted.
+    Kdd::Result studies(const SearchQuery& query, std::vector<FoundStudy>& found, int* behind = nullptr);
 
-    /// In the order of their studies, then by number and UID.
-    Kdd::Result series(const SearchQuery& query, std::vector<FoundSeries>& found);
+    /// The same of series, in the order of their studies, then by number and UID.
+    Kdd::Result series(const SearchQuery& query, std::vector<FoundSeries>& found, int* behind = nullptr);
 
     /// By name and identifier; only studies decide what is found.
     Kdd::Result patients(const SearchQuery& query, std::vector<FoundPatient>& found);

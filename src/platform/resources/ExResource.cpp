@@ -43,6 +43,12 @@ constexpr Setting kSettleSeconds = {"KDD_SETTLE_SECONDS", "archive/settleseconds
 constexpr Setting kReadPatience = {"KDD_READ_PATIENCE", "tagfiles/readpatience", "2000"};
 constexpr Setting kSessionHosts = {"KDD_SESSION_HOSTS", "web/sessionhosts", ""};
 constexpr Setting kShareConnections = {"KDD_SHARE_CONNECTIONS", "web/shareconnections", "0"};
+constexpr Setting kObjectsFolder = {"KDD_OBJECTS", "folders/objects", ""};
+constexpr Setting kSameUid = {"KDD_SAME_UID", "archive/sameuid", "refuse"};
+constexpr Setting kFreeSpace = {"KDD_FREE_SPACE", "archive/freespace", "1024"};
+constexpr Setting kObjectSize = {"KDD_OBJECT_SIZE", "archive/objectsize", "4096"};
+constexpr Setting kServerStow = {"KDD_SERVER_STOW", "server/stow", "0"};
+constexpr Setting kServerRequestSize = {"KDD_SERVER_REQUEST_SIZE", "server/requestsize", "65536"};
 constexpr Setting kServerListen = {"KDD_SERVER_LISTEN", "server/listen", "127.0.0.1:8042"};
 constexpr Setting kServerStatus = {"KDD_SERVER_STATUS", "server/status", ""};
 constexpr Setting kServerAccess = {"KDD_SERVER_ACCESS", "server/access", ""};
@@ -209,6 +215,36 @@ int ExResource::settleSeconds()
 bool ExResource::sharesConnections()
 {
     return valueOf(kShareConnections) == "1";
+}
+
+QByteArray ExResource::objectsFolder()
+{
+    return valueOf(kObjectsFolder);
+}
+
+QByteArray ExResource::sameUid()
+{
+    return valueOf(kSameUid);
+}
+
+int ExResource::freeSpace()
+{
+    return numberOf(kFreeSpace, 0, 1'000'000'000);
+}
+
+int ExResource::objectSize()
+{
+    return numberOf(kObjectSize, 1, 1024 * 1024);
+}
+
+bool ExResource::serverTakesObjects()
+{
+    return valueOf(kServerStow) == "1";
+}
+
+int ExResource::serverRequestSize()
+{
+    return numberOf(kServerRequestSize, 1, 16 * 1024 * 1024);
 }
 
 QByteArray ExResource::serverListen()

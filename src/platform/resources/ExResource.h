@@ -75,7 +75,28 @@ public:
     /// load: only when the value is 1. KDD_SHARE_CONNECTIONS, web/shareconnections, "0".
     static bool sharesConnections();
 
+    // Objects that arrive over a network.
+
+    /// Folder of their files. KDD_OBJECTS, folders/objects, empty: "objects" in the store.
+    static QByteArray objectsFolder();
+
+    /// What becomes of one whose SOP Instance UID its study has with other content, "refuse" or "replace". KDD_SAME_UID,
+    /// archive/sameuid, "refuse".
+    static QByteArray sameUid();
+
+    /// How much of the folder's disk stays free [MiB], up to 1,000,000,000. KDD_FREE_SPACE, archive/freespace, "1024".
+    static int freeSpace();
+
+    /// How large one may be [MiB], 1 to 1,048,576. KDD_OBJECT_SIZE, archive/objectsize, "4096".
+    static int objectSize();
+
     // What `kdd serve` does when its options do not say it.
+
+    /// Whether it takes objects: only when the value is 1. KDD_SERVER_STOW, server/stow, "0".
+    static bool serverTakesObjects();
+
+    /// How large a request with objects may be [MiB], 1 to 16,777,216. KDD_SERVER_REQUEST_SIZE, server/requestsize, "65536".
+    static int serverRequestSize();
 
     /// Where it waits for requests, ADDRESS:PORT. KDD_SERVER_LISTEN, server/listen, "127.0.0.1:8042".
     static QByteArray serverListen();

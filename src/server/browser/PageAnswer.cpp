@@ -2,6 +2,8 @@
 
 #include "server/browser/PageFile.h"
 #include "server/http/AcceptHeader.h"
+#include "server/http/Compression.h"
+#include "server/http/GzipEncoder.h"
 
 #include <QCryptographicHash>
 #include <QJsonDocument>
@@ -70,7 +72,15 @@ Http::Response jsonAnswer(const Http::Request& request, const QJsonObject& objec
 {
     const QByteArray body = QJsonDocument(object).toJson(QJsonDocument::Compact);
     const QByteArray digest = QCryptographicHash::hash(body, QCryptographicHash::Sha256).toHex().left(32);
-    return answer(request, '"' + digest + '"', "application/json", body);
+    const bool isCompressed = Http::isWorthCompressing(request, body.size());
+    const QByteArray etag = '"' + digest + (isCompressed ? "-gzip\"" : "\"");
+    Http::Response response = isKnown(request, etag) ? marked(304, etag)
+                                                     : answer(request, etag, "application/json",
+                                                              isCompressed ? Http::gzipped(body) : body);
+    response.addHeader("Vary", "Accept-Encoding");
+    if (isCompressed && response.status == 200)
+        response.addHeader("Content-Encoding", "gzip");
+    return response;
 }
 
 Http::Response pictureAnswer(const Http::Request& request, const QByteArray& jpeg, const QByteArray& etag)

@@ -18,6 +18,15 @@ public:
     /// The answer to GET (and HEAD) on a path that is owned. The request's base is the address of DICOMweb, with its
     /// prefix: an object's is base + "/studies/1.2".
     virtual Http::Response answer(const Http::Request& request, const ResourcePath& path) = 0;
+
+    /// Whether something can be sent to the path, which need not be one that is owned.
+    virtual bool receives(const ResourcePath& /*path*/) const { return false; }
+
+    /// The answer to POST on such a path, given before the body: with a sink for that, or why it is not wanted.
+    virtual Http::Response receive(const Http::Request& /*request*/, const ResourcePath& /*path*/)
+    {
+        return Http::Response(405);
+    }
 };
 
 }  // namespace Kdd::DicomWeb

@@ -106,7 +106,10 @@ struct StudyShelf::Private
 
     bool isCurrent(Entry& entry, const QByteArray& path, Clock::time_point asked, bool needsTree);
     void read(Entry& entry, const QByteArray& uid, const QString& path);
-    Presence look(const QByteArray& uid, QByteArray& version, std::shared_ptr<const ServedStudy>* study);
+    Presence look(const QByteArray& uid, bool needsTree, QByteArray& version,
+                  std::shared_ptr<const ServedStudy>& study);
+
+    Http::CacheCount count;
 
     std::mutex mutex;
     QHash<QByteArray, std::shared_ptr<Entry>> entries;
@@ -231,10 +234,11 @@ void StudyShelf::Private::read(Entry& entry, const QByteArray& uid, const QStrin
     put(entry, nullptr, 0);
 }
 
-Presence StudyShelf::Private::look(const QByteArray& uid, QByteArray& version,
-                                   std::shared_ptr<const ServedStudy>* study)
+Presence StudyShelf::Private::look(const QByteArray& uid, bool needsTree, QByteArray& version,
+                                   std::shared_ptr<const ServedStudy>& study)
 {
     version.clear();
+    study.reset();
     if (!isUID(uid))
         return Presence::Absent;
     const Clock::time_point asked = Clock::now();
@@ -243,13 +247,14 @@ Presence StudyShelf::Private::look(const QByteArray& uid, QByteArray& version,
     Presence presence = Presence::Absent;
     {
         const std::lock_guard<std::mutex> lock(entry->reading);
-        if (!isCurrent(*entry, pathBytes(path), asked, study != nullptr))
+        const bool isReady = isCurrent(*entry, pathBytes(path), asked, needsTree);
+        if (!isReady)
             read(*entry, uid, path);
         presence = entry->presence;
         if (presence == Presence::Found) {
+            ++(isReady ? count.hits : count.misses);
             version = entry->version;
-            if (study != nullptr)
-                *study = studyOf(*entry);
+            study = studyOf(*entry);
         }
     }
     if (presence == Presence::Absent)
@@ -269,14 +274,19 @@ StudyShelf::~StudyShelf() = default;
 
 Presence StudyShelf::find(const QByteArray& studyUID, std::shared_ptr<const ServedStudy>& study)
 {
-    study.reset();
     QByteArray version;
-    return d->look(studyUID, version, &study);
+    return d->look(studyUID, true, version, study);
 }
 
-Presence StudyShelf::version(const QByteArray& studyUID, QByteArray& version)
+Presence StudyShelf::version(const QByteArray& studyUID, QByteArray& version,
+                             std::shared_ptr<const ServedStudy>& study)
 {
-    return d->look(studyUID, version, nullptr);
+    return d->look(studyUID, false, version, study);
+}
+
+const Http::CacheCount& StudyShelf::count() const
+{
+    return d->count;
 }
 
 }  // namespace Kdd::DicomWeb

@@ -1,5 +1,7 @@
 #pragma once
 
+#include "server/http/CacheCount.h"
+
 #include <QByteArray>
 
 #include <kddlib/TagFile.h>
@@ -48,6 +50,19 @@ enum class Presence {
     Damaged,  ///< told in the log
 };
 
+/// Images that have arrived and are not in their tag files yet. Called on several threads at the same time.
+class Arrivals
+{
+public:
+    virtual ~Arrivals() = default;
+
+    /// Brings in what has arrived of the study, whichever server took it. True when its tag file may show more now.
+    virtual bool bringIn(const QByteArray& studyUID) = 0;
+
+    /// Brings in what this server has taken: of the study, or of all studies when that is empty.
+    virtual void bringInOwn(const QByteArray& studyUID) = 0;
+};
+
 /// The tag files that were asked for last, read again as soon as they change. May be used on any thread.
 class StudyShelf
 {
@@ -59,14 +74,24 @@ public:
                         std::chrono::nanoseconds settledAge = std::chrono::milliseconds(2500));
     ~StudyShelf();
 
+    /// Who knows of images that tag files do not show yet; null: nobody. Set before it is used, and outlives it.
+    void setArrivals(Arrivals* arrivals) { mArrivals = arrivals; }
+    Arrivals* arrivals() const { return mArrivals; }
+
     /// The study as its file is now.
     Presence find(const QByteArray& studyUID, std::shared_ptr<const ServedStudy>& study);
 
-    /// The version alone, without reading the tree where the file was seen before.
-    Presence version(const QByteArray& studyUID, QByteArray& version);
+    /// The version, without reading the tree where the file was seen before; `study` is null then, unless it is there
+    /// anyway.
+    Presence version(const QByteArray& studyUID, QByteArray& version,
+                     std::shared_ptr<const ServedStudy>& study);
+
+    /// How often nothing had to be read of a tag file that is there.
+    const Http::CacheCount& count() const;
 
 private:
     struct Private;
+    Arrivals* mArrivals = nullptr;
     std::unique_ptr<Private> d;
 };
 

@@ -55,6 +55,12 @@ void Metrics::addGauge(const QByteArray& name, const QByteArray& help, std::func
     mGauges.push_back({name, help, std::move(value)});
 }
 
+void Metrics::addCache(const QByteArray& name, const CacheCount& count)
+{
+    const std::lock_guard<std::mutex> lock(mMutex);
+    mCaches[name] = &count;
+}
+
 void Metrics::count(const QByteArray& group, const Exchange& exchange)
 {
     const double seconds = std::chrono::duration<double>(exchange.duration).count();
@@ -102,10 +108,23 @@ QByteArray Metrics::latencyText() const
     return text;
 }
 
+QByteArray Metrics::cachesText() const
+{
+    QByteArray hits = heading("kdd_cache_hits_total", "What was asked for and ready.", "counter");
+    QByteArray misses =
+        heading("kdd_cache_misses_total", "What was asked for and had to be made or read.", "counter");
+    for (const auto& [name, count] : mCaches) {
+        const QByteArray label = "cache=\"" + name + '"';
+        hits += line("kdd_cache_hits_total", label, QByteArray::number(count->hits.load()));
+        misses += line("kdd_cache_misses_total", label, QByteArray::number(count->misses.load()));
+    }
+    return hits + misses;
+}
+
 QByteArray Metrics::text() const
 {
     const std::lock_guard<std::mutex> lock(mMutex);
-    QByteArray text = requestsText() + latencyText();
+    QByteArray text = requestsText() + latencyText() + cachesText();
     for (const Gauge& gauge : mGauges)
         text += heading(gauge.name, gauge.help, "gauge") +
                 line(gauge.name, {}, QByteArray::number(gauge.value()));

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "server/http/CacheCount.h"
 #include "server/http/Exchange.h"
 
 #include <array>
@@ -23,6 +24,9 @@ public:
 
     /// A number that is asked for when it is needed, on any thread, as long as this lives.
     void addGauge(const QByteArray& name, const QByteArray& help, std::function<qint64()> value);
+
+    /// A cache that counts for itself, as long as this lives. `name` is its label.
+    void addCache(const QByteArray& name, const CacheCount& count);
 
     /// `group` is one of few, and never made of what a client sends.
     void count(const QByteArray& group, const Exchange& exchange);
@@ -53,12 +57,14 @@ private:
         std::function<qint64()> value;
     };
 
+    QByteArray cachesText() const;
     QByteArray requestsText() const;
     QByteArray latencyText() const;
 
     mutable std::mutex mMutex;
     std::map<QByteArray, Family> mCounters;  // by name
     std::vector<Gauge> mGauges;
+    std::map<QByteArray, const CacheCount*> mCaches;                  // by name
     std::map<std::tuple<QByteArray, Method, int>, qint64> mRequests;  // by group, method, status
     std::map<QByteArray, Latency> mLatencies;                         // by group
 };

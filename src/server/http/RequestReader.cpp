@@ -3,11 +3,12 @@
 #include "server/http/RequestTarget.h"
 
 #include <boost/beast/core/string.hpp>
+#include <boost/beast/http/buffer_body.hpp>
 #include <boost/beast/http/parser.hpp>
-#include <boost/beast/http/string_body.hpp>
 
 #include <algorithm>
 #include <cstring>
+#include <limits>
 #include <optional>
 
 namespace Kdd::Http
@@ -16,7 +17,7 @@ namespace
 {
 
 namespace http = boost::beast::http;
-using Parser = http::request_parser<http::string_body>;
+using Parser = http::request_parser<http::buffer_body>;
 
 QByteArray bytesOf(boost::beast::string_view text)
 {
@@ -63,10 +64,33 @@ bool isHost(const QByteArray& text)
 
 struct RequestReader::Private
 {
+    boost::beast::error_code put();
+    bool awaitsLeave();
+
     QByteArray unread;
     std::optional<Parser> parser;
+    bool isUnderstood = false;  // the header, and what it says
     bool gaveLeave = false;
 };
+
+/// Once more of what is there.
+boost::beast::error_code RequestReader::Private::put()
+{
+    boost::beast::error_code fault;
+    const std::size_t used = parser->put(
+        boost::asio::const_buffer(unread.constData(), static_cast<std::size_t>(unread.size())), fault);
+    unread.remove(0, static_cast<int>(used));
+    return fault;
+}
+
+/// True once.
+bool RequestReader::Private::awaitsLeave()
+{
+    if (gaveLeave || !boost::beast::iequals(parser->get()[http::field::expect], "100-continue"))
+        return false;
+    gaveLeave = true;
+    return true;
+}
 
 RequestReader::RequestReader(Limits limits)
     : mLimits(limits)
@@ -101,32 +125,86 @@ RequestReader::State RequestReader::advance()
             return State::Between;
         d->parser.emplace();
         d->parser->header_limit(mLimits.header);
-        d->parser->body_limit(static_cast<std::uint64_t>(mLimits.body));
+        // How much of a body is taken is for whoever takes it.
+        d->parser->body_limit(std::numeric_limits<std::uint64_t>::max());
         d->parser->eager(true);
+        d->isUnderstood = false;
         d->gaveLeave = false;
+        mLetGo = 0;
     }
-    while (!d->parser->is_done() && !d->unread.isEmpty()) {
-        boost::beast::error_code fault;
-        const std::size_t used = d->parser->put(
-            boost::asio::const_buffer(d->unread.constData(), static_cast<std::size_t>(d->unread.size())),
-            fault);
-        d->unread.remove(0, static_cast<int>(used));
+    while (!d->parser->is_header_done() && !d->unread.isEmpty()) {
+        const boost::beast::error_code fault = d->put();
         if (fault == http::error::need_more)
             break;
-        if (fault)
+        // The body begins, for which there is no place yet.
+        if (fault && fault != http::error::need_buffer)
             return refuse(statusOf(fault));
     }
-    if (d->parser->is_done())
-        return finish();
-    if (d->parser->is_header_done() && !d->gaveLeave &&
-        boost::beast::iequals(d->parser->get()[http::field::expect], "100-continue")) {
-        d->gaveLeave = true;
-        return State::AwaitsLeave;
+    if (!d->parser->is_header_done())
+        return State::Begun;
+    if (!d->isUnderstood) {
+        const State understood = understand();
+        if (understood == State::Refused)
+            return understood;
+        d->isUnderstood = true;
+        if (mRequest.method == Method::Post)
+            return State::Headed;
     }
-    return State::Begun;
+    return letGo();
 }
 
-RequestReader::State RequestReader::finish()
+/// Reads the body for nothing.
+RequestReader::State RequestReader::letGo()
+{
+    const auto length = d->parser->content_length();
+    if (length && *length > static_cast<std::uint64_t>(mLimits.body))
+        return refuse(413);
+    char block[4096];
+    while (true) {
+        int count = 0;
+        switch (readBody(block, sizeof block, count)) {
+        case Body::Block:
+            mLetGo += count;
+            if (mLetGo > mLimits.body)
+                return refuse(413);
+            break;
+        case Body::Awaited:
+            return State::Begun;
+        case Body::AwaitsLeave:
+            return State::AwaitsLeave;
+        case Body::End:
+            return State::Whole;
+        case Body::Malformed:
+            return refuse(400);
+        }
+    }
+}
+
+RequestReader::Body RequestReader::readBody(char* to, int size, int& count)
+{
+    count = 0;
+    while (d->parser && !d->parser->is_done() && !d->unread.isEmpty() && count < size) {
+        auto& body = d->parser->get().body();
+        body.data = to + count;
+        body.size = static_cast<std::size_t>(size - count);
+        body.more = true;
+        const boost::beast::error_code fault = d->put();
+        count = size - static_cast<int>(body.size);
+        if (fault == http::error::need_more)
+            break;
+        if (fault && fault != http::error::need_buffer)
+            return Body::Malformed;
+    }
+    if (count > 0)
+        return Body::Block;
+    if (d->parser && !d->parser->is_done())
+        return d->awaitsLeave() ? Body::AwaitsLeave : Body::Awaited;
+    d->parser.reset();
+    return Body::End;
+}
+
+/// Takes over what the header says.
+RequestReader::State RequestReader::understand()
 {
     const auto& message = d->parser->get();
     mRequest = {};
@@ -143,7 +221,6 @@ RequestReader::State RequestReader::finish()
             ++hosts;
         }
     }
-    d->parser.reset();
     RequestTarget target;
     // Of two hosts whoever stands in front of us may have looked at the other one.
     if (hosts > 1 || (hosts == 0 && !mIsOldVersion) || !RequestTarget::parse(mRequest.target, target))

@@ -15,13 +15,14 @@ public:
     struct Limits
     {
         unsigned header = 0;
-        qint64 body = 0;
+        qint64 body = 0;  ///< of one that is let go
     };
 
     enum class State {
         Between,      ///< nothing of the next request is there
         Begun,        ///< more of it has to come
         AwaitsLeave,  ///< the client holds its body back until it is told to go on
+        Headed,       ///< a request whose body is read by `readBody`
         Whole,
         Refused,  ///< nothing more can be read from this client
     };
@@ -37,9 +38,20 @@ public:
     /// The status that tells the client why it was refused, and what was understood before.
     int refusal() const { return mRefusal; }
 
-    /// The request that is whole, or what is known of one that is not; without base, peer and id. Its body was read and
-    /// let go: nothing that is answered here has one. The next call of `advance` begins with the next request.
+    /// The request that is whole or has its header, or what is known of one that is not; without base, peer and id. The
+    /// body of any but POST was read and let go. The next call of `advance` begins with the next request.
     Request take();
+
+    enum class Body {
+        Block,    ///< `count` bytes of it are there
+        Awaited,  ///< more of it has to come
+        AwaitsLeave,
+        End,
+        Malformed,
+    };
+
+    /// The next bytes of the body, until its end, of a request that is headed.
+    Body readBody(char* to, int size, int& count);
 
     // Of the request that was taken last.
 
@@ -56,12 +68,14 @@ private:
     struct Private;
 
     State refuse(int status);
-    State finish();
+    State understand();
+    State letGo();
 
     Limits mLimits;
     std::unique_ptr<Private> d;
     Request mRequest;
     QByteArray mHost;
+    qint64 mLetGo = 0;  // of the body
     int mRefusal = 0;
     bool mKeepsConnection = false;
     bool mIsOldVersion = false;

@@ -25,6 +25,22 @@ public:
     virtual Result next(QByteArray& block) = 0;
 };
 
+struct Response;
+
+/// Takes the body of a request block by block, as fast as it can, and then answers. It goes without having been asked for
+/// the answer when the client goes. Used by one thread at a time, not always the same.
+class BodySink
+{
+public:
+    virtual ~BodySink() = default;
+
+    /// False: no more of the body is wanted, and the answer tells why.
+    virtual bool take(const char* bytes, int size) = 0;
+
+    /// The answer, once the body has come whole or no more of it is wanted.
+    virtual Response answer() = 0;
+};
+
 /// What an answer consists of, in this order. Its length is known unless there is a producer, and is then sent.
 using BodyPart = std::variant<QByteArray, FileRange, std::unique_ptr<Producer>>;
 
@@ -34,6 +50,10 @@ struct Response
     QVector<Field> headers;  ///< Content-Length, Transfer-Encoding, Connection and Date come from the session
     std::vector<BodyPart> body;
     QByteArray caller;  ///< who asked, for those who are told of the exchange; empty where nobody knows
+
+    /// Of a request whose body decides: takes the body and gives the answer, to which `headers` are added. POST is answered
+    /// before its body is read, so that who may not send it need not; without a sink a small body is let go.
+    std::unique_ptr<BodySink> sink;
 
     Response() = default;
     explicit Response(int code)

@@ -14,8 +14,9 @@ constexpr int kReadBlock = 16 * 1024;  // [bytes]
 
 /// A client that was refused while it still sends would lose the answer if the connection were closed under it. It may go
 /// on for a little, and for so much.
-constexpr auto kDrainTime = std::chrono::seconds(2);
-constexpr qint64 kDrainBytes = 1024 * 1024;
+constexpr auto kDrainTime = std::chrono::seconds(5);
+constexpr qint64 kDrainBytes = 64 * 1024 * 1024;
+constexpr int kDrainBlocks = 64;  // between two looks at other connections
 
 Response busy(const QString& reason)
 {
@@ -67,7 +68,7 @@ void Session::refuse()
 
 void Session::stop()
 {
-    if (!mIsWithWorker && !mWriter)
+    if (!mIsWithWorker && !mWriter && !mSink)
         close();
 }
 
@@ -93,6 +94,9 @@ void Session::expire()
 {
     if (mWriter) {
         close();
+    } else if (mSink) {
+        mIsWithWorker = true;
+        endBody(failure(408, reasonFor(408)), Afterwards::Close);
     } else if (mIsRequest && !mIsDraining) {
         answerAtOnce(failure(408, reasonFor(408)), Afterwards::Close);
     } else {
@@ -167,8 +171,11 @@ void Session::readOn()
     case RequestReader::State::Begun:
         wait(Connection::For::Reading, &Session::receive);
         break;
+    case RequestReader::State::Headed:
+        dispatch(true);
+        break;
     case RequestReader::State::Whole:
-        dispatch();
+        dispatch(false);
         break;
     case RequestReader::State::Refused:
         prepareRequest();
@@ -198,12 +205,14 @@ void Session::prepareRequest()
                     (mReader.host().isEmpty() ? mHost.settings.address.text() : mReader.host());
 }
 
-void Session::dispatch()
+void Session::dispatch(bool hasBody)
 {
     prepareRequest();
+    mHasBody = hasBody;
     if (++mHost.answering > mHost.settings.requests) {
         --mHost.answering;
-        answerAtOnce(busy(QStringLiteral("There are too many requests")), Afterwards::Stay);
+        answerAtOnce(busy(QStringLiteral("There are too many requests")),
+                     hasBody ? Afterwards::Close : Afterwards::Stay);
         return;
     }
     mIsWithWorker = true;
@@ -234,7 +243,11 @@ void Session::answer()
     }
     mCaller = response.caller;
     --mHost.answering;
-    write(std::move(response));
+    if (!mHasBody) {
+        write(std::move(response));
+        return;
+    }
+    beginBody(std::move(response));
 }
 
 void Session::write(Response response)
@@ -309,6 +322,16 @@ void Session::report(bool isWhole)
     mRequest = {};
 }
 
+/// The client went before its request was whole.
+void Session::reportBrokenOff()
+{
+    mSink.reset();
+    --mHost.inFlight;
+    const auto duration = std::chrono::duration_cast<std::chrono::microseconds>(Clock::now() - mBegan);
+    mHost.observer.ended({mRequest, 400, 0, duration, false, {}});
+    mRequest = {};
+}
+
 void Session::closeSoftly()
 {
     mTransport->endWriting();
@@ -319,17 +342,23 @@ void Session::closeSoftly()
 
 void Session::drain()
 {
+    // It may have come to its end while this waited for its turn.
+    if (!mConnection->isOpen())
+        return;
     char bytes[kReadBlock];
     int count = 0;
     auto outcome = Transport::Outcome::Done;
-    while (outcome == Transport::Outcome::Done && mDrained < kDrainBytes) {
+    for (int i = 0; i < kDrainBlocks && outcome == Transport::Outcome::Done; ++i) {
         outcome = mTransport->read(bytes, kReadBlock, count);
         mDrained += count;
     }
-    if (outcome == Transport::Outcome::WantsRead)
-        wait(Connection::For::Reading, &Session::drain);
-    else
+    const bool mayGoOn = outcome == Transport::Outcome::Done || outcome == Transport::Outcome::WantsRead;
+    if (!mayGoOn || mDrained > kDrainBytes || Clock::now() > mDeadline)
         close();
+    else if (outcome == Transport::Outcome::Done)
+        mConnection->post([self = shared_from_this()] { self->drain(); });
+    else
+        wait(Connection::For::Reading, &Session::drain);
 }
 
 void Session::close()
@@ -338,6 +367,8 @@ void Session::close()
         return;
     if (mWriter)
         report(false);
+    else if (mSink)
+        reportBrokenOff();
     mConnection->close();
     mClosed(*this);
 }

@@ -28,8 +28,8 @@ struct SessionHost
 /// One client's connection: reads requests one after the other, has each answered on a worker thread, and sends the
 /// answers in that order.
 ///
-/// It belongs to the thread of its I/O, but for the time in which a worker answers or sends: then nothing waits for the
-/// socket, and the worker hands the session back when it is done or the client takes no more.
+/// It belongs to the thread of its I/O, but for the time in which a worker answers, sends or takes a body: then nothing
+/// waits for the socket, and the worker hands the session back when it is done or the client takes, or sends, no more.
 class Session : public std::enable_shared_from_this<Session>
 {
 public:
@@ -62,15 +62,22 @@ private:
     void readOn();
     void tellToGoOn();
     void prepareRequest();
-    void dispatch();
+    void dispatch(bool hasBody);
     void answerAtOnce(Response response, Afterwards afterwards);
     void answer();
+    void beginBody(Response response);
+    void receiveBody();
+    void takeBody();
+    void awaitBody();
+    void endBody(Response response, Afterwards afterwards);
+    bool isTooSlow() const;
     void write(Response response);
     void send();
     void sent(ResponseWriter::Step step);
     void sendOn();
     void finish();
     void report(bool isWhole);
+    void reportBrokenOff();
     void closeSoftly();
     void drain();
     void close();
@@ -84,6 +91,11 @@ private:
     QByteArray mPeer;
     QByteArray mCaller;  // of the request that is answered
     std::optional<ResponseWriter> mWriter;
+    std::unique_ptr<BodySink> mSink;  // while a body is received
+    QVector<Field> mHeaders;          // of the answer that it gives
+    Clock::time_point mBodyBegan;
+    qint64 mBodyBytes = 0;
+    bool mHasBody = false;
     Clock::time_point mDeadline;
     Clock::time_point mBegan;  // of the request that is answered
     bool mIsRequest = false;   // something of a request has come that is not answered yet

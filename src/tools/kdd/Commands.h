@@ -25,6 +25,9 @@ struct GlobalOptions
 
     /// Folder of the volume files that are made here.
     QString volumeFolder() const { return store + QStringLiteral("/volumes"); }
+
+    /// Of the objects that arrive over a network, where the site's settings do not name another one.
+    QString objectFolder() const { return store + QStringLiteral("/objects"); }
 };
 
 /// How a command ends; the numbers are the exit codes.

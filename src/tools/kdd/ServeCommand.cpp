@@ -1,6 +1,7 @@
 #include "server/Server.h"
 #include "tools/kdd/Commands.h"
 #include "tools/kdd/Report.h"
+#include "tools/kdd/Store.h"
 
 #include <QFile>
 
@@ -36,6 +37,7 @@ struct ServeRequest
     QString viewer;
     QByteArray publicAddress;
     QList<QByteArray> hosts;
+    bool stow = false;
 };
 
 /// Whether the process would go with a terminal that is closed. nohup has that signal ignored.
@@ -146,8 +148,26 @@ void readLimits(const ServeRequest& request, Http::HttpSettings& http)
     http.stop = std::chrono::seconds(ExResource::serverStop());
 }
 
+bool readObjectRules(const GlobalOptions& options, ServerSettings& settings)
+{
+    constexpr qint64 kMiB = 1024 * 1024;
+    const QByteArray sameUid = ExResource::sameUid();
+    if (sameUid != "refuse" && sameUid != "replace") {
+        LogFile::errorf("What becomes of objects of the same UID is \"refuse\" or \"replace\", not \"%s\"",
+                        sameUid.constData());
+        return false;
+    }
+    ObjectRules& rules = settings.objects.emplace();
+    rules.folder = objectFolder(options);
+    rules.sameUid = sameUid == "replace" ? SameUid::Replace : SameUid::Refuse;
+    rules.freeBytes = ExResource::freeSpace() * kMiB;
+    rules.objectBytes = ExResource::objectSize() * kMiB;
+    settings.store.requestBytes = ExResource::serverRequestSize() * kMiB;
+    return true;
+}
+
 /// False, with the reason logged, when something is written that is none.
-bool readSettings(const ServeRequest& request, ServerSettings& settings)
+bool readSettings(const GlobalOptions& options, const ServeRequest& request, ServerSettings& settings)
 {
     const QByteArray status = orElse(request.status, ExResource::serverStatus());
     if (!readAddress(orElse(request.listen, ExResource::serverListen()), settings.http.address) ||
@@ -162,7 +182,7 @@ bool readSettings(const ServeRequest& request, ServerSettings& settings)
     settings.addresses.publicAddress = orElse(request.publicAddress, ExResource::serverPublicAddress());
     settings.addresses.hosts = wordsOf(ExResource::serverHosts()) + request.hosts.toVector();
     settings.addresses.proxies = wordsOf(ExResource::serverProxies());
-    return true;
+    return !(request.stow || ExResource::serverTakesObjects()) || readObjectRules(options, settings);
 }
 
 void tellAddress(const GlobalOptions& options, const Server& server, bool hasViewer)
@@ -203,7 +223,7 @@ void renewCertificate(Server& server)
 Outcome runServe(const GlobalOptions& options, const ServeRequest& request)
 {
     ServerSettings settings;
-    if (!readSettings(request, settings))
+    if (!readSettings(options, request, settings))
         return Outcome::WrongUsage;
     const ServerSignals received;
     const bool hasViewer = !settings.viewer.isEmpty();
@@ -252,6 +272,7 @@ void declareServe(CommandSet& commands)
                    request->viewer);
     arguments.text({"--public", kUrl, "Address under which clients reach the server"},
                    request->publicAddress);
+    arguments.flag("--stow", request->stow, "Take objects that clients send (STOW-RS)");
     arguments.texts({"--host", "NAME", "Further name by which the server may be asked; may be repeated"},
                     request->hosts);
 }

@@ -4,6 +4,7 @@
 
 #include <QByteArrayList>
 
+#include <kddlib/ExResource.h>
 #include <kddlib/FileStatus.h>
 #include <kddlib/FileWalk.h>
 #include <kddlib/Kxg.h>
@@ -86,11 +87,19 @@ qint64 sizeOf(const QString& path)
     return statusOf(pathBytes(path).constData(), status) ? status.size : 0;
 }
 
+QByteArray objectFolder(const GlobalOptions& options)
+{
+    const QByteArray configured = ExResource::objectsFolder();
+    return configured.isEmpty() ? pathBytes(options.objectFolder()) : configured;
+}
+
 QList<QByteArray> ownPlaces(const GlobalOptions& options)
 {
     // Folders end in a slash, files do not.
     QList<QByteArray> places = {absolutePath(TagFile::metaFolder()) + '/',
-                                absolutePath(pathBytes(options.volumeFolder())) + '/'};
+                                absolutePath(pathBytes(options.volumeFolder())) + '/',
+                                // Those that are whole may be taken in anew, but not what is just arriving.
+                                absolutePath(objectFolder(options)) + "/.incoming/"};
     const QByteArray address = Kxg::DatabaseServer();
     // A server keeps its files elsewhere.
     if (address.startsWith("sqlite:")) {

@@ -28,6 +28,9 @@ bool readTagFile(const QString& path, TagFile& file);
 /// How long a file is, whatever bytes its name is of; 0 when there is none [bytes].
 qint64 sizeOf(const QString& path);
 
+/// Where the files of objects are that arrive over a network.
+QByteArray objectFolder(const GlobalOptions& options);
+
 /// What the archive keeps itself and must not take in: tag files, volume files, the database.
 QList<QByteArray> ownPlaces(const GlobalOptions& options);
 

@@ -149,6 +149,9 @@ TEST(TagElement, GivesTypedValues)
     const auto typed = [](VrCode vr, const char* value) { return TagElement(vr, value).valueAsVariant(); };
     EXPECT_EQ(typed(VrCode::DA, "20201011 "), QVariant(day));
     EXPECT_EQ(typed(VrCode::DA, "2020101"), QVariant());
+    for (const auto& [vr, text] : {std::pair(VrCode::DA, "20201399"), std::pair(VrCode::TM, "250000"),
+                                   std::pair(VrCode::DT, "20201399120000")})
+        EXPECT_FALSE(typed(vr, text).isValid()) << text;
     EXPECT_EQ(typed(VrCode::DA, "20201011\\2020"), QVariant(QVariantList{day, QVariant()}));
     EXPECT_EQ(typed(VrCode::TM, "120304.123"), QVariant(QTime(12, 3, 4)));
     EXPECT_EQ(typed(VrCode::TM, "1203"), QVariant());

@@ -162,6 +162,7 @@ TEST_F(StackWriter, TellsReadersAllOfTheVolume)
         image.with(DCM_WindowCenter, "40\\300").with(DCM_WindowWidth, "400\\1500");
         image.with(DcmTag(DCM_PixelPaddingValue, EVR_US), "4000");
         image.with(DcmTag(DCM_PixelPaddingRangeLimit, EVR_US), "4095");
+        image.withLong(DCM_SeriesDescription, 3000);
     }
     images[0].with(DCM_LossyImageCompression, "01");
     const Stack stack = saved(images);
@@ -178,6 +179,8 @@ TEST_F(StackWriter, TellsReadersAllOfTheVolume)
     EXPECT_EQ(mMesh->parameters().real("WindowCenter", 0), 520);
     EXPECT_EQ(mMesh->parameters().real("WindowWidth", 0), 200);
     EXPECT_EQ(mMesh->parameters().bundle("DICOM").text("G0020-000E"), "UI:1.2.3");
+    EXPECT_EQ(mMesh->parameters().bundle("DICOM").text("G0008-103E"), "")
+        << "left out of the cache as too long";
 }
 
 TEST_F(StackWriter, NamesTheFramesOfAMultiFrameImage)

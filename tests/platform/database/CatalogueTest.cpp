@@ -97,6 +97,9 @@ TEST_P(CatalogueTest, ConflictsOfFilesAreTold)
               "/d/z also in other study /d/y of 2\n");
     EXPECT_EQ(conflictsOf({dicom("/d/a", "1", "1.2", "x")}),
               "/d/a also in other study /d/y of 2\n/d/a replaces /d/z of 1\n");
+    // A UID that cannot be stored as it is counts as what is stored.
+    EXPECT_EQ(conflictsOf({dicom("/d/u", "3", "3.1", "x\xff")}), "");
+    EXPECT_EQ(conflictsOf({dicom("/d/v", "3", "3.1", "x\xff")}), "/d/v replaces /d/u of 3\n");
 }
 
 TEST_P(CatalogueTest, ImagesAreListedWhereACorrectionPutThemAndFilesFollow)

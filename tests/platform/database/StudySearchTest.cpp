@@ -2,6 +2,9 @@
 
 #include "DatabaseFixture.h"
 #include "platform/database/SearchText.h"
+#include "support/Threads.h"
+
+#include <atomic>
 
 using namespace Kxg;
 
@@ -183,6 +186,31 @@ TEST_P(StudySearchTest, PagesFollowEachOtherInEveryOrder)
     }
 }
 
+TEST_P(StudySearchTest, WhatIsBehindAPageIsCountedAlong)
+{
+    for (const char* uid : {"1", "2", "3", "4", "5"})
+        build(uid, aStudy("A", "20240101", uid, {"CT"}));
+    struct Row
+    {
+        int offset, limit, counted, found, behind;
+    };
+    for (const Row& row : {Row{0, 2, 9, 2, 3}, Row{1, 2, 1, 2, 1}, Row{3, 2, 9, 2, 0}, Row{0, 0, 9, 0, 5}}) {
+        SearchQuery query;
+        query.offset = row.offset;
+        query.limit = row.limit;
+        query.counted = row.counted;
+        std::vector<FoundStudy> studies;
+        std::vector<FoundSeries> series;
+        int behind[] = {-1, -1};
+        ASSERT_TRUE(search().studies(query, studies, &behind[0]).good());
+        ASSERT_TRUE(search().series(query, series, &behind[1]).good());
+        EXPECT_EQ(static_cast<int>(studies.size()), row.found);
+        EXPECT_EQ(static_cast<int>(series.size()), row.found);
+        EXPECT_EQ(behind[0], row.behind);
+        EXPECT_EQ(behind[1], row.behind);
+    }
+}
+
 TEST_P(StudySearchTest, WhatIsRegisteredOnlyIsFound)
 {
     DicomFileRecord file = dicom("/d/a", "1.2", "1.2.1", "x");
@@ -221,6 +249,53 @@ TEST_P(StudySearchTest, ChangesAreTold)
     EXPECT_EQ(changes(), "1A1 2A2 3C1 4A1 5D1 6D2 ");
     EXPECT_EQ(changes(4), "5D1 6D2 ");
     EXPECT_EQ(find({}), "1");
+}
+
+/// Whatever isolation a server is set up for.
+TEST_P(StudySearchTest, WhoFollowsTheChangesMissesNone)
+{
+    constexpr int kWriters = 4;
+    constexpr int kStudies = 10;
+    if (GetParam() == Engine::Postgres)
+        execute(("ALTER DATABASE " + address().mid(address().lastIndexOf("@/") + 2).split('?').front() +
+                 " SET default_transaction_isolation = 'repeatable read'")
+                    .constData());
+    catalogue();
+    std::atomic<int> writing{kWriters};
+    qint64 last = 0;
+    Kdd::onThreads(kWriters + 1, [&](int thread) {
+        Kdd::Result result;
+        const auto follower = StudySearch::open(address(), result);
+        const auto writer = open();
+        for (int i = 0; i < kStudies && thread < kWriters; ++i) {
+            const QByteArray uid = QByteArray::number(thread) + '.' + QByteArray::number(i);
+            QMap<QByteArray, qint64> requests;
+            EXPECT_TRUE(
+                writer
+                    ->registerFiles(
+                        {{dicom(uid.constData(), uid.constData(), uid.constData(), uid.constData())}, {}, {}},
+                        requests)
+                    .good());
+            std::unique_ptr<StudyClaim> claim;
+            EXPECT_TRUE(writer->claim(uid, 0, claim, Catalogue::IfAbsent::Fail).good());
+            BuiltStudy built;
+            built.tagFile = {5, uid};
+            built.search = aStudy("A", "20240101", "P", {"CT"});
+            EXPECT_EQ(claim->finish(built).text().toStdString(), "");
+        }
+        if (thread < kWriters) {
+            --writing;
+            return;
+        }
+        std::vector<StudyChangeNote> noted;
+        for (bool isLast = false; !isLast || !noted.empty();) {
+            isLast = writing == 0;  // asked before, so that the last look comes after the last change
+            EXPECT_TRUE(follower->changes(last, 3, noted).good());
+            for (const StudyChangeNote& each : noted)
+                EXPECT_EQ(each.position, ++last);
+        }
+    });
+    EXPECT_EQ(last, kWriters * kStudies);
 }
 
 TEST_P(StudySearchTest, OnlyOneRefreshesWhatSeveralFoundOld)

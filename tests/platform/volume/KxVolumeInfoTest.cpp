@@ -82,6 +82,12 @@ const RangeCase kRanges[] = {
      0, 2000},
     {"OfTheModalityTable", ramp().withItem(DCM_ModalityLUTSequence, lookUp({3, 99, 16}, {7, 500, 900})), 7,
      900},
+    {"OfTheModalityTableWithoutPadding",
+     ramp()
+         .words({0, 100, 100, 2000})
+         .numbers(DCM_PixelPaddingValue, {2000})
+         .withItem(DCM_ModalityLUTSequence, lookUp({3, 99, 16}, {7, 500, 900})),
+     7, 500},
     {"OfTheVoiTable", ramp().withItem(DCM_VOILUTSequence, lookUp({2, 99, 16}, {10, 4000})), 10, 4000},
     {"OfTheWindowOfTheFrame",
      ramp()

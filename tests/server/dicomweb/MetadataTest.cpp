@@ -1,6 +1,7 @@
 #include "server/dicomweb/metadata/MetadataResource.h"
 #include "support/DatasetBuilder.h"
 #include "support/FileContent.h"
+#include "support/Gzip.h"
 #include "support/LogCapture.h"
 #include "support/RealFiles.h"
 #include "support/Setting.h"
@@ -19,10 +20,10 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <kddlib/DicomJson.h>
+#include <kddlib/LogFile.h>
 #include <kddlib/QAData.h>
 #include <kddlib/TagMap.h>
 #include <sys/stat.h>
-#include <zlib.h>
 
 #include <functional>
 #include <sstream>
@@ -32,21 +33,6 @@ using namespace Kdd::DicomWeb;
 
 namespace
 {
-
-QByteArray unpacked(const QByteArray& gzip)
-{
-    z_stream stream = {};
-    EXPECT_EQ(inflateInit2(&stream, 15 + 16), Z_OK);
-    QByteArray out(100 * gzip.size() + 65536, Qt::Uninitialized);
-    stream.next_in = reinterpret_cast<z_const Bytef*>(const_cast<char*>(gzip.constData()));
-    stream.avail_in = static_cast<uInt>(gzip.size());
-    stream.next_out = reinterpret_cast<Bytef*>(out.data());
-    stream.avail_out = static_cast<uInt>(out.size());
-    EXPECT_EQ(inflate(&stream, Z_FINISH), Z_STREAM_END);
-    out.resize(static_cast<int>(stream.total_out));
-    inflateEnd(&stream);
-    return out;
-}
 
 /// An answer as a client has it.
 struct Received
@@ -267,6 +253,8 @@ TEST_F(MetadataTest, IsKeptCompressedAndTheSameEachTime)
     const Received second = get("1.2/metadata", kGzip);
     EXPECT_FALSE(first.wasKept);
     EXPECT_TRUE(second.wasKept);
+    EXPECT_EQ(mResource.keptCount().misses.load(), 1);
+    EXPECT_EQ(mResource.keptCount().hits.load(), 1);
     EXPECT_EQ(first.headers.value("Content-Encoding"), "gzip");
     EXPECT_EQ(first.headers, second.headers);
     EXPECT_EQ(first.body, second.body);
@@ -276,6 +264,15 @@ TEST_F(MetadataTest, IsKeptCompressedAndTheSameEachTime)
               get("1.2/series/1.2.3/instances/1.1/metadata").body);
     EXPECT_FALSE(get("1.2/metadata?includefield=PatientName", kGzip).wasKept);
     EXPECT_EQ(keptFiles().size(), 2);
+}
+
+TEST_F(MetadataTest, IsMadeOfATagFileThatIsReadOnce)
+{
+    write();
+    LogFile::setLevel(LogFile::Level::Timing);
+    const LogCapture log;
+    get("1.2/metadata");  // of a file so young that it may be changed unnoticed
+    EXPECT_EQ(log.count("Cache file read"), 1);
 }
 
 TEST_F(MetadataTest, IsNotSentAgainToWhoeverHasIt)
@@ -339,7 +336,7 @@ TEST_F(MetadataTest, ShowsEveryChangeAtOnceAlsoWhereItIsKept)
 
 TEST_F(MetadataTest, KeepsNothingOfAnAnswerThatIsNotTakenToItsEnd)
 {
-    write();
+    write(2000);  // more than one block compressed
     Http::Request request;
     request.headers = kGzip;
     ResourcePath path;

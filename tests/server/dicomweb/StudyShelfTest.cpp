@@ -61,7 +61,8 @@ protected:
     static QByteArray versionIn(StudyShelf& shelf, const char* uid = kStudy)
     {
         QByteArray version;
-        const Presence presence = shelf.version(uid, version);
+        std::shared_ptr<const ServedStudy> study;
+        const Presence presence = shelf.version(uid, version, study);
         EXPECT_EQ(presence == Presence::Found, !version.isEmpty());
         return version;
     }
@@ -199,6 +200,8 @@ TEST_F(StudyShelfTest, ReadsAgainOnlyWhatChangedOrHadToGo)
     EXPECT_EQ(reads([&] { EXPECT_EQ(found(shelf) + found(shelf), "DoeDoe"); }), 1);
     EXPECT_EQ(reads([&] { found(shelf, "1.3"); }), 1);
     EXPECT_EQ(reads([&] { versionIn(shelf); }), 0);
+    EXPECT_EQ(shelf.count().misses.load(), 2);
+    EXPECT_EQ(shelf.count().hits.load(), 2);
     EXPECT_EQ(reads([&] { found(shelf); }), 1);
     replace();
     EXPECT_EQ(reads([&] { EXPECT_EQ(found(shelf) + found(shelf), "NewNew"); }), 1);

@@ -135,10 +135,15 @@ Reply Client::reply(Body body)
         return reply;
     reply.head = take(mUnread.indexOf("\r\n\r\n") + 4);
     reply.status = reply.head.mid(9, 3).toInt();
+    reply.isWhole = body == Body::StaysBehind || reply.status == 204 || reply.status == 304;
+    return reply.isWhole ? reply : bodyAfter(reply);
+}
+
+Reply Client::bodyAfter(Reply reply)
+{
+    reply.isWhole = false;
     const QByteArray length = reply.header("Content-Length");
-    if (body == Body::StaysBehind || reply.status == 204 || reply.status == 304) {
-        reply.isWhole = true;
-    } else if (reply.header("Transfer-Encoding") == "chunked") {
+    if (reply.header("Transfer-Encoding") == "chunked") {
         receiveChunks(reply);
     } else if (!length.isEmpty()) {
         reply.body = take(length.toLongLong());
@@ -148,6 +153,26 @@ Reply Client::reply(Body body)
         reply.isWhole = true;
     }
     return reply;
+}
+
+QByteArray Client::certificate() const
+{
+    if (!mIsConnected)
+        return {};
+    const std::unique_ptr<X509, void (*)(X509*)> shown(SSL_get1_peer_certificate(mTls.get()), X509_free);
+    unsigned char* bytes = nullptr;
+    const int size = i2d_X509(shown.get(), &bytes);
+    const QByteArray copied(reinterpret_cast<const char*>(bytes), qMax(0, size));
+    OPENSSL_free(bytes);
+    return copied;
+}
+
+void Client::reset()
+{
+    const linger atOnce = {1, 0};
+    ::setsockopt(mSocket, SOL_SOCKET, SO_LINGER, &atOnce, sizeof atOnce);
+    ::close(mSocket);
+    mSocket = -1;
 }
 
 QByteArray Client::rest()

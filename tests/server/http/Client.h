@@ -64,6 +64,15 @@ public:
     /// The next answer.
     Reply reply(Body body = Body::Follows);
 
+    /// What follows an answer that was received without its body.
+    Reply bodyAfter(Reply head);
+
+    /// What the server named itself by, in bytes.
+    QByteArray certificate() const;
+
+    /// Ends the connection without a word, what was received and not read included.
+    void reset();
+
     /// Everything up to the end of the connection.
     QByteArray rest();
 

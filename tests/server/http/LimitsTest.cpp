@@ -74,13 +74,16 @@ TEST(HttpLimits, LetABodyOfAGetPassUnread)
     EXPECT_EQ(client.reply().body, "c");
 }
 
-TEST(HttpLimits, EndAHeaderThatDoesNotComeInTime)
+TEST(HttpLimits, EndWhatDoesNotComeInTime)
 {
     RunningServer server(pathAsText, withPatience(1000));
     Client silent(server.address());
     Client slow(server.address());
     slow.send("GET / HTTP/1.1\r\nHost: loc");
+    Client half(server.address());
+    half.send("POST / HTTP/1.1\r\nHost: localhost\r\nContent-Length: 10\r\n\r\nhalf");
     EXPECT_EQ(slow.reply().status, 408);
+    EXPECT_EQ(half.reply().status, 408);
     EXPECT_EQ(slow.rest(), "");
     EXPECT_EQ(silent.rest(), "") << "who asked for nothing is told nothing";
     Client kept(server.address());

@@ -278,4 +278,43 @@ TEST_F(RenderTest, ShowsADocumentAsItIs)
     EXPECT_EQ(ask("rendered", {}, "*/*").status, 404) << "nothing that a browser would run";
 }
 
+DatasetBuilder aLine(const char* type, const char* name)
+{
+    return anItem()
+        .with(DCM_ValueType, type)
+        .withItem(DCM_ConceptNameCodeSequence, anItem().with(DCM_CodeMeaning, name));
+}
+
+TEST_F(RenderTest, TellsWhatAReportSaysAndNothingAsMarkup)
+{
+    const QByteArray hostile = "<script>alert(1)</script> & \"quoted\"\r\nM\xfcller";
+    DatasetBuilder number = aLine("NUM", "Diameter");
+    number.withItem(DCM_MeasuredValueSequence,
+                    anItem()
+                        .with(DCM_NumericValue, "12.5")
+                        .withItem(DCM_MeasurementUnitsCodeSequence, anItem().with(DCM_CodeValue, "mm")));
+    DatasetBuilder inner = aLine("CONTAINER", "Findings").withItem(DCM_ContentSequence, number);
+    inner.withItem(DCM_ContentSequence, aLine("TEXT", "Text").with(DCM_TextValue, hostile.constData()));
+    inner.withItem(DCM_ContentSequence, aLine("TEXT", "Long").withLong(DCM_TextValue, 5000));
+    DatasetBuilder report = anImage("1.4").inStudy("1.2").inSeries("1.3").with(DCM_ValueType, "CONTAINER");
+    report.with(DCM_SpecificCharacterSet, "ISO_IR 100").with(DCM_VerificationFlag, "UNVERIFIED");
+    store(report.withItem(DCM_ContentSequence, inner));
+
+    const QByteArray text = body(ask("rendered", {}, "text/plain"));
+    EXPECT_TRUE(text.contains("Verification: UNVERIFIED\n")) << text.constData();
+    EXPECT_TRUE(text.contains("\n  Findings\n    Diameter: 12.5 mm\n    Text: <script>")) << text.constData();
+    EXPECT_TRUE(text.contains("\n    M\xc3\xbcller\n"));
+    EXPECT_TRUE(text.contains("    Long: " + QByteArray(5000, 'x')));
+    const Http::Response page = ask("rendered", {}, "*/*");
+    EXPECT_EQ(page.headers.first().value, "text/html; charset=utf-8");
+    EXPECT_FALSE(body(page).contains("<script"));
+    EXPECT_TRUE(body(page).contains(
+        "<b>Text: </b>&lt;script&gt;alert(1)&lt;/script&gt; &amp; &quot;quoted&quot;<br>"));
+    EXPECT_EQ(body(page).count("<ul>"), body(page).count("</ul>"));
+    EXPECT_EQ(ask("rendered", {}, "image/jpeg").status, 406);
+    mHeld = tagOf(page);
+    EXPECT_EQ(ask("rendered", {}, "*/*").status, 304);
+    EXPECT_EQ(ask("rendered", {}, "text/plain").status, 200);
+}
+
 }  // namespace

@@ -6,6 +6,8 @@
 
 #include <QByteArray>
 
+#include <utility>
+
 namespace Kdd
 {
 
@@ -110,10 +112,10 @@ private:
 class KDD_EXPORT EncodedPixels
 {
 public:
-    EncodedPixels(MediaSource& file, const FrameIndex& index, const QByteArray& syntaxUID)
+    EncodedPixels(MediaSource& file, const FrameIndex& index, QByteArray syntaxUID)
         : mFile(file)
         , mIndex(index)
-        , mSyntaxUID(syntaxUID)
+        , mSyntaxUID(std::move(syntaxUID))
     {
     }
 

@@ -42,9 +42,13 @@ Kxg::BuiltStudy unsettled(const TagFile& file)
 CompletedStudy StudyCompletion::complete(Kxg::StudyClaim& claim, TagFile& arrivals,
                                          const QVector<qint64>& requests)
 {
-    Result read = readContents(claim);
-    if (read.bad())
-        return {read, false, {}};
+    const Result known = read(claim);
+    return known.good() ? completeRead(claim, arrivals, requests) : CompletedStudy{known, false, {}};
+}
+
+CompletedStudy StudyCompletion::completeRead(Kxg::StudyClaim& claim, TagFile& arrivals,
+                                             const QVector<qint64>& requests)
+{
     if (mContents.images.empty())
         return remove(claim);
     TagFile present;
@@ -55,9 +59,9 @@ CompletedStudy StudyCompletion::complete(Kxg::StudyClaim& claim, TagFile& arriva
 
 CompletedStudy StudyCompletion::reduce(Kxg::StudyClaim& claim)
 {
-    Result read = readContents(claim);
-    if (read.bad())
-        return {read, false, {}};
+    Result known = read(claim);
+    if (known.bad())
+        return {known, false, {}};
     if (mContents.images.empty())
         return remove(claim);
     TagFile present;
@@ -85,14 +89,14 @@ CompletedStudy StudyCompletion::reduce(Kxg::StudyClaim& claim)
 
 CompletedStudy StudyCompletion::build(Kxg::StudyClaim& claim)
 {
-    Result read = readContents(claim);
-    if (read.bad())
-        return {read, false, {}};
+    Result known = read(claim);
+    if (known.bad())
+        return {known, false, {}};
     return mContents.images.empty() ? remove(claim) : build(claim, TagFile());
 }
 
 /// What was requested up to now is seen by what is read after it.
-Result StudyCompletion::readContents(Kxg::StudyClaim& claim)
+Result StudyCompletion::read(Kxg::StudyClaim& claim)
 {
     Result result = claim.noteRequests();
     if (result.good())

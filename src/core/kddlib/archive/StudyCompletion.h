@@ -45,6 +45,14 @@ public:
     /// ignored. `requests` are those that registering them left. What `arrivals` holds afterwards is not settled.
     CompletedStudy complete(Kxg::StudyClaim& claim, TagFile& arrivals, const QVector<qint64>& requests);
 
+    /// The same in two steps, for whoever gathers arrivals while others register more of them: `read` takes in what the
+    /// catalogue has and what is requested, and the arrivals known by then are completed with.
+    Result read(Kxg::StudyClaim& claim);
+    CompletedStudy completeRead(Kxg::StudyClaim& claim, TagFile& arrivals, const QVector<qint64>& requests);
+
+    /// Whether something changed, of what was read, since the tag file was built.
+    bool isChanged() const { return !mContents.changes.isEmpty(); }
+
     /// After a removal from a study of which nothing else had changed: takes out what is not listed any more, without
     /// opening a file where the tag file can be trusted.
     CompletedStudy reduce(Kxg::StudyClaim& claim);
@@ -53,7 +61,6 @@ public:
     CompletedStudy build(Kxg::StudyClaim& claim);
 
 private:
-    Result readContents(Kxg::StudyClaim& claim);
     static CompletedStudy remove(Kxg::StudyClaim& claim);
     CompletedStudy build(Kxg::StudyClaim& claim, const TagFile& loaded) const;
     bool canMerge(const QByteArray& studyUID, const TagFile& arrivals, const QVector<qint64>& requests,

@@ -249,8 +249,9 @@ void ImageWriter::value(Target& target, const AttributeName& name, const TagElem
                         const Place& place)
 {
     const bool isText = isTextVr(element.vr());
-    const bool isKept = !isText || (isAsciiText(element.value()) &&
-                                    (mConversion->keepsAscii() || !isInCharacterSet(element.vr())));
+    const bool isKept =
+        !isText || (isAsciiText(element.value()) &&
+                    (!isInCharacterSet(element.vr()) || mConversion->keepsAscii(place.characterSet)));
     if (isKept && mForm.plainValue(target.text, name.key, element.vr(), element.value()))
         return;
     // What is seldom met goes the way of DCMTK, by itself.

@@ -268,9 +268,8 @@ void JsonForm::endOmitted(QByteArray& out) const
 
 QByteArray JsonForm::addressPart(const QByteArray& text) const
 {
-    const bool isPlain = std::all_of(text.begin(), text.end(), [](char c) {
-        return c >= ' ' && c <= '~' && c != '"' && c != '\\';
-    });
+    const bool isPlain = std::all_of(text.begin(), text.end(),
+                                     [](char c) { return c >= ' ' && c <= '~' && c != '"' && c != '\\'; });
     if (isPlain)
         return text;
     std::ostringstream escaped;

@@ -80,6 +80,19 @@ QByteArray TextConversion::characterSetOf(const TagMap& item, const QByteArray& 
     return own.isEmpty() ? above : own;
 }
 
+bool TextConversion::keepsAscii(const QByteArray& characterSet) const
+{
+    switch (mWay) {
+    case Way::Together:
+        return !mReplacesAscii;
+    case Way::Each:
+        return !replacesTilde(characterSet);
+    case Way::AsStored:
+        return true;
+    }
+    return true;
+}
+
 unsigned int TextConversion::convert(DcmElement& element, const QByteArray& characterSet)
 {
     switch (mWay) {

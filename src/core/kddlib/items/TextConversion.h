@@ -59,8 +59,8 @@ public:
     /// Of an item, where those above have the one given.
     QByteArray characterSetOf(const TagMap& item, const QByteArray& above) const;
 
-    /// Whether texts of nothing but printable ASCII stay as they are.
-    bool keepsAscii() const { return mWay != Way::Together || !mReplacesAscii; }
+    /// Whether texts of nothing but printable ASCII, declared to be in that set, stay as they are.
+    bool keepsAscii(const QByteArray& characterSet) const;
 
     /// Converts a value and gives what was found.
     unsigned int convert(DcmElement& element, const QByteArray& characterSet);

@@ -29,6 +29,13 @@ bool isAscii(const QByteArray& bytes)
                        [](char c) { return c != kEscape && static_cast<signed char>(c) >= 0; });
 }
 
+/// Whether the bytes are the text. Of the sets of DICOM one has another character than ASCII where that has the tilde, and
+/// is converted so where images are shown. (Its other one, for the backslash, stands between values.)
+bool isText(const QByteArray& bytes, const QByteArray& characterSet)
+{
+    return isAscii(bytes) && (!bytes.contains('~') || !replacesTilde(characterSet));
+}
+
 /// Decodes with one of Qt's codecs; false when bytes are left that it cannot explain.
 bool decodeWith(const char* codecName, const QByteArray& bytes, QString& text)
 {
@@ -82,7 +89,7 @@ bool decodeJapanese(const QByteArray& bytes, const QByteArray& characterSet, QSt
 QString decodePart(const QByteArray& bytes, const QByteArray& characterSet)
 {
     QString text;
-    if (isAscii(bytes))
+    if (isText(bytes, characterSet))
         return QString::fromLatin1(bytes);
     if (decodeByDeclaration(bytes, characterSet, text) || decodeJapanese(bytes, characterSet, text) ||
         decodeWith("UTF-8", bytes, text))
@@ -161,9 +168,14 @@ void declareUtf8InItems(DcmItem& item)
 
 }  // namespace
 
+bool replacesTilde(const QByteArray& characterSet)
+{
+    return characterSet.trimmed() == "ISO_IR 13";
+}
+
 QString decodeText(const QByteArray& bytes, const QByteArray& characterSet)
 {
-    if (isAscii(bytes))
+    if (isText(bytes, characterSet))
         return QString::fromLatin1(bytes);
     QString text;
     int start = 0;
@@ -203,7 +215,8 @@ bool convertValueToUtf8(DcmElement& element, const QByteArray& characterSet)
     if (!DcmVR(element.getVR()).isaString() || element.getString(text).bad() || text == nullptr)
         return false;
     const QByteArray bytes(text);
-    if (isAscii(bytes))
+    // Codes and dates are ASCII whatever is declared.
+    if (isText(bytes, element.isAffectedBySpecificCharacterSet() ? characterSet : QByteArray()))
         return false;
     const QByteArray converted = decodeText(bytes, characterSet).toUtf8();
     element.putString(converted.constData());

@@ -45,7 +45,7 @@ function countOf(study, tag) {
 }
 
 function line(text, isSoft = false) {
-  return h('span', { class: isSoft ? 'line soft value' : 'line value' }, text);
+  return h('span', { class: isSoft ? 'line soft value' : 'line value', title: text.trim() || null }, text);
 }
 
 function row(study) {
@@ -60,7 +60,7 @@ function row(study) {
   const accession = first(study, '00080050');
   return h('li', {}, h('a', { class: 'study', href: `#/studies/${encodeURIComponent(uid)}`, 'data-uid': uid, tabindex: -1 },
     picture(addresses.studyPreview(uid), ''),
-    h('span', { class: 'who' }, h('span', { class: 'line first value' }, name), line(who || ' ', true)),
+    h('span', { class: 'who' }, h('span', { class: 'line first value', title: name }, name), line(who || ' ', true)),
     h('span', { class: 'when number' }, line(date(day) || 'No date'), line(time(first(study, '00080030')), true)),
     h('span', { class: 'badges' }, values(study, '00080061').map((one) => h('span', { class: 'badge' }, String(one)))),
     h('span', { class: 'what' }, line(description || 'No description', !description)),

@@ -86,7 +86,9 @@ bool KeptAnswers::find(const QByteArray& name, Http::FileRange& answer)
     // Its content never changes, but its times tell of its use.
     answer.file = Http::OpenFile::open(pathOf(name), result, Http::OpenFile::Changes::Ignored);
     // What a crash of the machine left may have a name and nothing else.
-    if (answer.file == nullptr || answer.file->size() == 0)
+    const bool isThere = answer.file != nullptr && answer.file->size() > 0;
+    ++(isThere ? mCount.hits : mCount.misses);
+    if (!isThere)
         return false;
     answer.offset = 0;
     answer.length = answer.file->size();

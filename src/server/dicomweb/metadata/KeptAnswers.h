@@ -1,5 +1,6 @@
 #pragma once
 
+#include "server/http/CacheCount.h"
 #include "server/http/OpenFile.h"
 
 #include <QByteArray>
@@ -24,6 +25,9 @@ public:
 
     /// The answer of that name; false when there is none. It stays readable when it is removed.
     bool find(const QByteArray& name, Http::FileRange& answer);
+
+    /// How often `find` had it.
+    const Http::CacheCount& count() const { return mCount; }
 
     /// An answer that is being made. What is not kept in the end was never there. Used by one thread at a time.
     class Draft
@@ -60,6 +64,7 @@ private:
 
     QByteArray mFolder;
     qint64 mCapacity;
+    Http::CacheCount mCount;
     std::atomic<qint64> mAdded;  // since the last clean-up [bytes]
 };
 

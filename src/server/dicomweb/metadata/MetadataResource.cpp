@@ -74,25 +74,28 @@ Http::Response MetadataResource::answer(const Http::Request& request, const Reso
     if (!metadata.read(request, path, status, reason))
         return Http::failure(status, reason);
 
+    if (mStudies.arrivals() != nullptr)
+        mStudies.arrivals()->bringInOwn(path.study);
     // The version alone answers whoever has the answer already or gets one that is kept: both exist only of what was
     // there in this version.
     QByteArray version;
-    Presence presence = mStudies.version(path.study, version);
+    std::shared_ptr<const ServedStudy> study;
+    Presence presence = mStudies.version(path.study, version, study);
     if (presence != Presence::Found)
         return notThere(presence);
     const QByteArray tag = entityTag(metadata, version);
     if (hasEntity(request, tag, false))
         return withTag(304, tag);
     Http::FileRange kept;
-    if (metadata.takesGzip && mKept.find(nameOf(metadata, version), kept)) {
+    if (metadata.takesGzip && path.instance.isEmpty() && mKept.find(nameOf(metadata, version), kept)) {
         Http::Response response = withTag(200, tag);
         response.addHeader("Content-Type", metadata.contentType());
         response.addHeader("Content-Encoding", "gzip");
         response.body.emplace_back(std::move(kept));
         return response;
     }
-    std::shared_ptr<const ServedStudy> study;
-    presence = mStudies.find(path.study, study);
+    if (study == nullptr)
+        presence = mStudies.find(path.study, study);
     return presence == Presence::Found ? answerFrom(std::move(study), request, metadata) : notThere(presence);
 }
 

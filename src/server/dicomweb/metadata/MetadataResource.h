@@ -24,6 +24,9 @@ public:
     bool owns(const ResourcePath& path) const override;
     Http::Response answer(const Http::Request& request, const ResourcePath& path) override;
 
+    /// Of the answers about several images for clients that take them compressed.
+    const Http::CacheCount& keptCount() const { return mKept.count(); }
+
 private:
     Http::Response answerFrom(std::shared_ptr<const ServedStudy> study, const Http::Request& request,
                               const MetadataRequest& metadata);

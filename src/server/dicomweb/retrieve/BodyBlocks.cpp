@@ -8,7 +8,8 @@ namespace Kdd::DicomWeb
 namespace
 {
 
-constexpr qint64 kBlock = 256 * 1024;  // of what is read from files [bytes]
+// Each client that does not read holds one [bytes].
+constexpr qint64 kBlock = 64 * 1024;
 
 }  // namespace
 

@@ -6,9 +6,27 @@
 namespace Kdd::DicomWeb
 {
 
+namespace
+{
+
+bool shows(const ServedStudy& study, const ResourcePath& path)
+{
+    return study.look([&](const TagFile& file) {
+        return path.instance.isEmpty() ? path.series.isEmpty() || file.findSeries(path.series) != nullptr
+                                       : findImage(file, path) != nullptr;
+    });
+}
+
+}  // namespace
+
 Verdict findStudy(StudyShelf& shelf, const ResourcePath& path, std::shared_ptr<const ServedStudy>& study)
 {
-    switch (shelf.find(path.study, study)) {
+    Presence presence = shelf.find(path.study, study);
+    // What is asked for may have arrived a moment ago.
+    const bool mayHaveArrived = presence == Presence::Absent || (study != nullptr && !shows(*study, path));
+    if (mayHaveArrived && shelf.arrivals() != nullptr && shelf.arrivals()->bringIn(path.study))
+        presence = shelf.find(path.study, study);
+    switch (presence) {
     case Presence::Found:
         return {};
     case Presence::Absent:
@@ -31,8 +49,8 @@ Verdict listImages(const ServedStudy& study, const ResourcePath& path, QVector<L
 {
     study.look([&](const TagFile& file) {
         const auto add = [&](const TagMap& image) {
-            images.append({TagFile::imageKey(image), image.uid(TagMap::SeriesLevel),
-                           image.uid(TagMap::ImageLevel)});
+            images.append(
+                {TagFile::imageKey(image), image.uid(TagMap::SeriesLevel), image.uid(TagMap::ImageLevel)});
         };
         if (!path.instance.isEmpty()) {
             const TagMap* image = findImage(file, path);

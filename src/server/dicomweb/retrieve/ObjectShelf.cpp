@@ -68,6 +68,7 @@ Result ObjectShelf::find(const QByteArray& path, FoundObject& found)
         if (isKnown)
             seen = *known;
     }
+    ++(isKnown ? mCount.hits : mCount.misses);
     if (!isKnown) {
         result = examine(path, found, seen);
         if (result.bad())

@@ -2,6 +2,7 @@
 
 #include "server/dicomweb/retrieve/StoredObject.h"
 #include "server/dicomweb/retrieve/Verdict.h"
+#include "server/http/CacheCount.h"
 
 #include <QCache>
 
@@ -32,6 +33,9 @@ public:
     /// log has the path and the reason.
     Verdict open(const ImageOrigin& origin, FoundObject& found);
 
+    /// How often a file was remembered.
+    const Http::CacheCount& count() const { return mCount; }
+
 private:
     struct Remembered
     {
@@ -42,6 +46,7 @@ private:
     Result find(const QByteArray& path, FoundObject& found);
     Result examine(const QByteArray& path, FoundObject& found, Remembered& seen);
 
+    Http::CacheCount mCount;
     std::mutex mMutex;
     QCache<QByteArray, Remembered> mSeen;  // by path and identity
 };

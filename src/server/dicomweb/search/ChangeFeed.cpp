@@ -1,6 +1,7 @@
 #include "server/dicomweb/search/ChangeFeed.h"
 
 #include "server/dicomweb/search/AnswerObject.h"
+#include "server/http/Compression.h"
 
 #include <QDateTime>
 
@@ -79,7 +80,9 @@ Http::Response ChangeFeed::answer(const Http::Request& request, const ResourcePa
     for (const Kxg::StudyChangeNote& change : changes)
         body += (&change == &changes.front() ? "" : ",") + jsonOf(change);
     body += "],\"last\":" + QByteArray::number(changes.empty() ? after : changes.back().position) + '}';
-    return Http::textResponse(200, "application/json", body);
+    Http::Response response = Http::textResponse(200, "application/json", body);
+    Http::compress(request, response);
+    return response;
 }
 
 }  // namespace Kdd::DicomWeb

@@ -79,11 +79,12 @@ void addModalities(AnswerObject& object, const QByteArray& modalities)
     object.add("00080061", "{\"vr\":\"CS\",\"Value\":[" + list + "]}");
 }
 
-QByteArray ownJson(const TagMap& image, const std::vector<DcmTagKey>& keys, bool isWhole)
+QByteArray ownJson(const TagMap& image, const std::vector<DcmTagKey>& keys, bool isWhole,
+                   const QByteArray& address)
 {
     std::ostringstream json;
     if (isWhole) {
-        writeDicomJson(json, image, std::string());
+        writeDicomJson(json, image, (address + "/bulkdata").toStdString());
         return QByteArray::fromStdString(json.str());
     }
     TagMap chosen;
@@ -124,9 +125,17 @@ void FoundAnswers::begin(AnswerObject& object, const QByteArray& address) const
 
 void FoundAnswers::finish(AnswerObject& object)
 {
-    if (mCount++ > 0)
+    if (!mEnds.empty())
         mJson += ',';
     object.write(mJson);
+    mEnds.push_back(mJson.size());
+}
+
+QByteArray FoundAnswers::object(int index) const
+{
+    const auto at = static_cast<std::size_t>(index);
+    const int begin = index == 0 ? 0 : mEnds[at - 1] + 1;
+    return mJson.mid(begin, mEnds[at] - begin);
 }
 
 QByteArray FoundAnswers::addressOf(const Kxg::FoundStudy& study) const
@@ -198,9 +207,10 @@ void FoundAnswers::add(const Kxg::FoundSeries& series)
 void FoundAnswers::add(const Kxg::FoundSeries& series, const TagMap& image)
 {
     AnswerObject object;
-    begin(object,
-          addressOf(series.study) + "/series/" + series.uid + "/instances/" + image.uid(TagMap::ImageLevel));
-    object.addObject(ownJson(image, mImageKeys, mRequest.showsAll));
+    const QByteArray address =
+        addressOf(series.study) + "/series/" + series.uid + "/instances/" + image.uid(TagMap::ImageLevel);
+    begin(object, address);
+    object.addObject(ownJson(image, mImageKeys, mRequest.showsAll, address));
     if (mRequest.series.isEmpty())
         addSeries(object, series);
     if (mRequest.study.isEmpty())

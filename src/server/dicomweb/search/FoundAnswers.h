@@ -23,10 +23,13 @@ public:
     void add(const Kxg::FoundSeries& series);
     void add(const Kxg::FoundSeries& series, const TagMap& image);
 
-    int count() const { return mCount; }
+    int count() const { return static_cast<int>(mEnds.size()); }
 
     /// A JSON array.
     QByteArray json() const { return '[' + mJson + ']'; }
+
+    /// One object of it, by its number from 0 on.
+    QByteArray object(int index) const;
 
 private:
     void begin(AnswerObject& object, const QByteArray& address) const;
@@ -40,7 +43,7 @@ private:
     std::vector<QByteArray> mFields;
     std::vector<DcmTagKey> mImageKeys;
     QByteArray mJson;
-    int mCount = 0;
+    std::vector<int> mEnds;  // of the objects in the text
 };
 
 }  // namespace Kdd::DicomWeb

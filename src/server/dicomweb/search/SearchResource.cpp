@@ -1,14 +1,18 @@
 #include "server/dicomweb/search/SearchResource.h"
 
+#include "server/dicomweb/search/AnswerXml.h"
 #include "server/dicomweb/search/SearchRun.h"
 #include "server/http/AcceptHeader.h"
+#include "server/http/Compression.h"
+#include "server/http/MultipartWriter.h"
 
 namespace Kdd::DicomWeb
 {
 namespace
 {
 
-const QVector<Http::MediaType> kOffers = {{"application/dicom+json", ""}, {"application/json", ""}};
+const QVector<Http::MediaType> kOffers = {
+    {"application/dicom+json", {}}, {"application/json", {}}, {"multipart/related", kXmlMediaType}};
 
 void addWarnings(const SearchRequest& request, const SearchRun& run, const QByteArray& root,
                  Http::Response& response)
@@ -18,10 +22,27 @@ void addWarnings(const SearchRequest& request, const SearchRun& run, const QByte
         response.addHeader("Warning", begin + "There are " + (run.isRemainingCut() ? "at least " : "") +
                                           QByteArray::number(run.remaining()) +
                                           " additional results that can be requested");
+    if (run.unread() > 0)
+        response.addHeader("Warning", begin + QByteArray::number(run.unread()) +
+                                          (run.unread() == 1 ? " study" : " studies") + " could not be read");
     if (request.isFuzzy)
         response.addHeader("Warning",
                            begin + "The fuzzymatching parameter is not supported. Only literal matching has"
                                    " been performed.");
+}
+
+Http::Response answerOf(const FoundAnswers& answers, const Http::MediaType& type)
+{
+    if (type.parts.isEmpty())
+        return Http::textResponse(200, type.name, answers.json());
+    // Without parts there is no such body.
+    if (answers.count() == 0)
+        return Http::Response(204);
+    Http::MultipartWriter parts(type.parts);
+    QByteArray body;
+    for (int i = 0; i < answers.count(); ++i)
+        body += xmlPart(answers.object(i), parts);
+    return Http::textResponse(200, parts.mediaType(), body + parts.finish());
 }
 
 }  // namespace
@@ -39,11 +60,17 @@ Http::Response SearchResource::answer(const Http::Request& request, const Resour
     QString reason;
     const int offer = Http::AcceptHeader::of(request).choose(kOffers);
     if (offer < 0)
-        return Http::failure(406, QStringLiteral("Searches are answered as application/dicom+json"));
+        return Http::failure(406, QStringLiteral("Searches are answered as application/dicom+json or "
+                                                 "multipart/related; type=\"application/dicom+xml\""));
     if (!SearchRequest::takePath(path, search))
         return Http::failure(404, QStringLiteral("No resource has this path"));
     if (!SearchRequest::parse(request.query, search, reason) || !SearchPlan::make(search, plan, reason))
         return Http::failure(400, reason);
+
+    // Studies that have just come are known at once, but not what they consist of.
+    const bool isBelowStudies = search.level == SearchLevel::Series || search.level == SearchLevel::Instances;
+    if (isBelowStudies && mShelf.arrivals() != nullptr)
+        mShelf.arrivals()->bringInOwn(path.study);
 
     const QByteArray root = request.base;
     Http::Response response;
@@ -60,12 +87,20 @@ Http::Response SearchResource::answer(const Http::Request& request, const Resour
             response.addHeader("Retry-After", "1");
             return done;
         }
-        response = Http::textResponse(200, kOffers.at(offer).name, answers.json());
+        if (run.unread() > 0 && !search.study.isEmpty()) {
+            response = Http::failure(500, QStringLiteral("The study's tag file is damaged"));
+            return done;
+        }
+        response = answerOf(answers, kOffers.at(offer));
+        response.addHeader("Vary", "Accept");
         addWarnings(search, run, root, response);
         return done;
     });
-    return result.good() ? std::move(response)
-                         : Http::failure(503, QStringLiteral("The image database cannot be asked now"));
+    if (result.bad())
+        return Http::failure(503, QStringLiteral("The image database cannot be asked now"));
+    if (response.status == 200)
+        Http::compress(request, response);
+    return response;
 }
 
 }  // namespace Kdd::DicomWeb

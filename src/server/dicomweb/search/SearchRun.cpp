@@ -1,7 +1,5 @@
 #include "server/dicomweb/search/SearchRun.h"
 
-#include <QSet>
-
 #include <dcmtk/dcmdata/dcdeftag.h>
 #include <kddlib/StudyIndexing.h>
 #include <kddlib/TagFile.h>
@@ -19,8 +17,11 @@ namespace
 constexpr int kMaxRows = 20000;
 constexpr int kMaxTagFiles = 500;
 
-// Clients only want to know that there is more; to count all of a large archive takes longer than to find the page.
+// Clients only want to know that there is more.
 constexpr int kMaxRemaining = 1000;
+
+// As many are found along with a page, nearly for nothing.
+constexpr int kCounted = 100;
 
 constexpr int kRowsAtOnce = 1000;
 constexpr int kSeriesAtOnce = 500;
@@ -111,20 +112,20 @@ Result SearchRun::run(FoundAnswers& answers)
     return {};
 }
 
-Result SearchRun::findStudies(const Kxg::SearchQuery& query, std::vector<Kxg::FoundStudy>& found)
+Result SearchRun::findStudies(const Kxg::SearchQuery& query, std::vector<Kxg::FoundStudy>& found, int* behind)
 {
-    return findCurrent(mSearch, found, [&] { return mSearch.studies(query, found); });
+    return findCurrent(mSearch, found, [&] { return mSearch.studies(query, found, behind); });
 }
 
-Result SearchRun::findSeries(const Kxg::SearchQuery& query, std::vector<Kxg::FoundSeries>& found)
+Result SearchRun::findSeries(const Kxg::SearchQuery& query, std::vector<Kxg::FoundSeries>& found, int* behind)
 {
-    return findCurrent(mSearch, found, [&] { return mSearch.series(query, found); });
+    return findCurrent(mSearch, found, [&] { return mSearch.series(query, found, behind); });
 }
 
-void SearchRun::noteRemaining(int remaining)
+void SearchRun::noteRemaining(int remaining, int most)
 {
-    mRemaining = std::max(0, std::min(remaining, kMaxRemaining));
-    mIsRemainingCut = remaining > kMaxRemaining;
+    mRemaining = std::max(0, std::min(remaining, most));
+    mIsRemainingCut = remaining > most;
 }
 
 // ---- looking once more
@@ -135,6 +136,8 @@ std::shared_ptr<const ServedStudy> SearchRun::obtain(const QByteArray& studyUID)
     std::shared_ptr<const ServedStudy> study;
     const Presence presence = mShelf.find(studyUID, study);
     mIsHeldUp = mIsHeldUp || presence == Presence::Held;
+    if (presence == Presence::Damaged)
+        mUnread.insert(studyUID);
     return study;
 }
 
@@ -165,7 +168,7 @@ bool SearchRun::holds(const Kxg::FoundSeries& series) const
 
 // ---- studies, series, patients
 
-/// `find(query, found)` and `count(query, most, number)` ask the database, `holds(found)` looks once more.
+/// `find(query, found, behind)` and `count(query, most, number)` ask the database, `holds(found)` looks once more.
 template <typename Found, typename Find, typename Count, typename Holds>
 Result SearchRun::runListed(FoundAnswers& answers, const Find& find, const Count& count, const Holds& holds)
 {
@@ -173,17 +176,13 @@ Result SearchRun::runListed(FoundAnswers& answers, const Find& find, const Count
     std::vector<Found> found;
     if (mPlan.isExact()) {
         query.offset = mRequest.offset;
-        query.limit = mRequest.limit + 1;
-        Result result = find(query, found);
-        const int shown = std::min(mRequest.limit, static_cast<int>(found.size()));
-        for (int i = 0; i < shown; ++i)
-            answers.add(found[static_cast<size_t>(i)]);
-        if (result.bad() || static_cast<int>(found.size()) == shown)
-            return result;
-        int all = 0;
-        const int before = mRequest.offset + shown;
-        result = count(query, before + kMaxRemaining + 1, all);
-        noteRemaining(all - before);
+        query.limit = mRequest.limit;
+        query.counted = kCounted + 1;
+        int behind = 0;
+        const Result result = find(query, found, &behind);
+        for (const Found& each : found)
+            answers.add(each);
+        noteRemaining(behind, kCounted);
         return result;
     }
     // How many are to be looked at is bounded, and so is what is in memory of them.
@@ -199,7 +198,7 @@ Result SearchRun::runListed(FoundAnswers& answers, const Find& find, const Count
     }
     query.limit = kRowsAtOnce;
     for (query.offset = 0; result.good() && query.offset < candidates; query.offset += kRowsAtOnce) {
-        result = find(query, found);
+        result = find(query, found, nullptr);
         for (const Found& each : found) {
             if (!holds(each))
                 continue;
@@ -208,14 +207,15 @@ Result SearchRun::runListed(FoundAnswers& answers, const Find& find, const Count
             ++matched;
         }
     }
-    noteRemaining(matched - mRequest.offset - answers.count());
+    noteRemaining(matched - mRequest.offset - answers.count(), kMaxRemaining);
     return result;
 }
 
 Result SearchRun::runStudies(FoundAnswers& answers)
 {
     return runListed<Kxg::FoundStudy>(
-        answers, [this](const auto& query, auto& found) { return findStudies(query, found); },
+        answers,
+        [this](const auto& query, auto& found, int* behind) { return findStudies(query, found, behind); },
         [this](const auto& query, int most, int& number) {
             return mSearch.countStudies(query, most, number);
         },
@@ -225,7 +225,8 @@ Result SearchRun::runStudies(FoundAnswers& answers)
 Result SearchRun::runSeries(FoundAnswers& answers)
 {
     return runListed<Kxg::FoundSeries>(
-        answers, [this](const auto& query, auto& found) { return findSeries(query, found); },
+        answers,
+        [this](const auto& query, auto& found, int* behind) { return findSeries(query, found, behind); },
         [this](const auto& query, int most, int& number) { return mSearch.countSeries(query, most, number); },
         [this](const Kxg::FoundSeries& series) {
             return holds(series) && holdsImage(series.study.uid, series.uid);

@@ -4,6 +4,8 @@
 #include "server/dicomweb/search/FoundAnswers.h"
 #include "server/dicomweb/search/SearchPlan.h"
 
+#include <QSet>
+
 namespace Kdd::DicomWeb
 {
 
@@ -30,6 +32,9 @@ public:
     /// Others held a tag file all the time: what was found is not all.
     bool isHeldUp() const { return mIsHeldUp; }
 
+    /// How many tag files would have had to be looked at and cannot be read.
+    int unread() const { return mUnread.size(); }
+
     /// How many more the search would find behind the page; counted up to a bound.
     int remaining() const { return mRemaining; }
     bool isRemainingCut() const { return mIsRemainingCut; }
@@ -42,14 +47,15 @@ private:
     Result runPatients(FoundAnswers& answers);
     Result runImages(FoundAnswers& answers);
 
-    Result findStudies(const Kxg::SearchQuery& query, std::vector<Kxg::FoundStudy>& found);
-    Result findSeries(const Kxg::SearchQuery& query, std::vector<Kxg::FoundSeries>& found);
+    Result findStudies(const Kxg::SearchQuery& query, std::vector<Kxg::FoundStudy>& found, int* behind);
+    Result findSeries(const Kxg::SearchQuery& query, std::vector<Kxg::FoundSeries>& found,
+                      int* behind = nullptr);
 
     bool holds(const Kxg::FoundStudy& study) const;
     bool holds(const Kxg::FoundSeries& series) const;
     bool holdsImage(const QByteArray& studyUID, const QByteArray& seriesUID);
     std::shared_ptr<const ServedStudy> obtain(const QByteArray& studyUID);
-    void noteRemaining(int remaining);
+    void noteRemaining(int remaining, int most);
 
     int addImages(const Kxg::FoundSeries& series, int skipped, int wanted, FoundAnswers& answers);
     bool takeImages(const std::vector<Kxg::FoundSeries>& page, int& skipped, FoundAnswers& answers);
@@ -60,6 +66,7 @@ private:
     StudyShelf& mShelf;
     QString mTooBroad;
     bool mIsHeldUp = false;
+    QSet<QByteArray> mUnread;  // studies
     int mRemaining = 0;
     bool mIsRemainingCut = false;
 };

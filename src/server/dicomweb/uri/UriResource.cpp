@@ -1,5 +1,6 @@
 #include "server/dicomweb/uri/UriResource.h"
 
+#include "server/dicomweb/render/WholeValue.h"
 #include "server/dicomweb/retrieve/ImageFinder.h"
 #include "server/dicomweb/uri/UriRequest.h"
 
@@ -16,7 +17,7 @@ namespace
 
 const QByteArray kDicom("application/dicom");
 
-/// What an instance can be given as, the first by default: a picture where it is one, else the object.
+/// What an instance can be given as, the first by default: a picture where it is one, a report in words, else the object.
 Verdict offersFor(const ServedStudy& study, const UriRequest& wanted, QVector<Http::MediaType>& offers)
 {
     return study.look([&](const TagFile& file) -> Verdict {
@@ -31,6 +32,8 @@ Verdict offersFor(const ServedStudy& study, const UriRequest& wanted, QVector<Ht
             offers = {{"image/jpeg", {}}, {"image/png", {}}, {kDicom, {}}};
         else if (isImage)
             offers = {{kDicom, {}}, {"image/jpeg", {}}, {"image/png", {}}};
+        else if (isReport(*image))
+            offers = {{"text/html", {}}, {"text/plain", {}}, {kDicom, {}}};
         else
             offers = {{kDicom, {}}, {"application/pdf", {}}};
         for (const char* video : {"video/mp4", "video/mpeg", "video/mp2t"}) {

@@ -1,6 +1,10 @@
 #include "SearchedArchive.h"
+#include "support/Threads.h"
 
+#include <QDateTime>
 #include <QFile>
+
+#include <atomic>
 
 using namespace Kdd;
 using namespace Kdd::DicomWeb;
@@ -167,6 +171,87 @@ TEST_P(SearchOperations, ATagFileOfAnotherTimeIsShownAsItIs)
     EXPECT_EQ(shown(), "1 Doe^John 3; 2 Roe^Jane 1; ");
     kdd("build --all");
     EXPECT_EQ(shown(), "1 Doe^John 3; 2 Roe^Jane 1; ");
+}
+
+TEST_P(SearchOperations, ATagFileFromABackupIsFoundByWhatItSaysOnceItWasLookedAt)
+{
+    QFile file(tagFile("1"));
+    ASSERT_TRUE(file.open(QIODevice::ReadOnly));
+    const QByteArray former = file.readAll();
+    const QDateTime written = file.fileTime(QFileDevice::FileModificationTime);
+    file.close();
+    correct("1", "1.1", "", kName, "Poe^P");
+    EXPECT_EQ(studies("PatientName=poe"), "1");
+    ASSERT_TRUE(file.open(QIODevice::WriteOnly | QIODevice::Truncate) && file.write(former) == former.size());
+    ASSERT_TRUE(file.flush() && file.setFileTime(written, QFileDevice::FileModificationTime));
+    file.close();
+    EXPECT_EQ(studies("PatientName=doe"), "");  // which nobody has looked at yet
+    EXPECT_EQ(studies("PatientName=poe"), "");  // found, looked at and another one
+    EXPECT_EQ(studies("PatientName=doe"), "1");
+    EXPECT_EQ(values("studies/1/instances?includefield=PatientName", "00100010"), "Doe^John Doe^John");
+    kdd("build --all");
+    EXPECT_EQ(shown(), "1 Poe^P 2; 2 Roe^Jane 1; ");
+}
+
+TEST_P(SearchOperations, ADamagedTagFileIsToldOfWhereItIsNeeded)
+{
+    QFile file(tagFile("1"));
+    ASSERT_TRUE(file.open(QIODevice::WriteOnly | QIODevice::Truncate) && file.write("no tag file") > 0);
+    file.close();
+    EXPECT_EQ(shown(), "1 Doe^John 2; 2 Roe^Jane 1; ");  // what was known of it
+    EXPECT_EQ(get("studies/1/instances").status, 500);
+    const Http::Response all = get("instances?PatientName=*oe*");
+    EXPECT_EQ(all.status, 200);
+    EXPECT_TRUE(std::any_of(all.headers.begin(), all.headers.end(), [](const Http::Field& each) {
+        return each.name == "Warning" && each.value.contains("1 study could not be read");
+    }));
+}
+
+/// Each of several processes adds, corrects and deletes studies, while one reader follows the feed in small steps.
+TEST_P(SearchOperations, TheFeedSkipsNothingOfWhatProcessesDoAtOnce)
+{
+    constexpr int kWriters = 3;
+    told();
+    for (int i = 0; i < kWriters; ++i) {
+        QDir().mkpath(path("images") + QLatin1Char('/') + QString::number(i));
+        for (int k = 0; k < 4; ++k) {
+            const QByteArray study = "5." + QByteArray::number(i) + '.' + QByteArray::number(k);
+            store((QByteArray::number(i) + '/' + study).constData(),
+                  anImage((study + ".1.1").constData())
+                      .inStudy(study.constData())
+                      .inSeries((study + ".1").constData()));
+        }
+    }
+    std::atomic<int> writing{kWriters};
+    std::vector<qint64> seen;
+    const int first = mLast;
+    onThreads(kWriters + 1, [&](int thread) {
+        if (thread < kWriters) {
+            const QString folder = path("images") + QLatin1Char('/') + QString::number(thread);
+            kdd({QStringLiteral("add"), folder});
+            for (int k = 0; k < 3; ++k)
+                kdd({QStringLiteral("delete"), QStringLiteral("5.%1.%2").arg(thread).arg(k)});
+            --writing;
+            return;
+        }
+        for (bool isLast = false; !isLast;) {
+            isLast = writing == 0;  // asked before, so that the last look comes after the last change
+            for (bool isMore = true; isMore;) {
+                const qint64 last = seen.empty() ? first : seen.back();
+                const QByteArray target = "changefeed?limit=2&after=" + QByteArray::number(last);
+                const QJsonArray changes = QJsonDocument::fromJson(bodyOf(get(target.constData())))
+                                               .object()
+                                               .value(QLatin1String("changes"))
+                                               .toArray();
+                for (const QJsonValue& each : changes)
+                    seen.push_back(each.toObject().value(QLatin1String("position")).toInt());
+                isMore = !changes.isEmpty();
+            }
+        }
+    });
+    ASSERT_EQ(seen.size(), kWriters * 7u);  // four arrived, three deleted
+    for (std::size_t i = 0; i < seen.size(); ++i)
+        EXPECT_EQ(seen[i], first + 1 + static_cast<qint64>(i));
 }
 
 TEST_P(SearchOperations, AnArchiveFromBeforeSearchesIsFilledOnce)

@@ -65,11 +65,12 @@ protected:
     void add() const { kdd({QStringLiteral("add"), path("images")}); }
 
     /// "studies?PatientName=*x*", as it stands in an address.
-    Http::Response get(const char* target)
+    Http::Response get(const char* target, const QVector<Http::Field>& headers = {})
     {
         const QList<QByteArray> parts = QByteArray(target).split('?');
         Http::Request request;
         request.base = "http://host/dicom-web";
+        request.headers = headers;
         for (const QByteArray& segment : parts.front().split('/'))
             request.path.append(segment);
         for (const QByteArray& field : QByteArray(target).mid(parts.front().size() + 1).split('&')) {

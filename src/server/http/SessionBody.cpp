@@ -1,0 +1,153 @@
+#include "server/http/Session.h"
+
+#include <kddlib/LogFile.h>
+
+namespace Kdd::Http
+{
+namespace
+{
+
+// A worker that takes a body lets others have their turn after so much of it.
+constexpr int kBodyBlock = 64 * 1024;  // [bytes]
+constexpr int kBlocksPerTurn = 64;
+
+/// Whoever sends less [bytes/s] holds a connection for nothing.
+constexpr qint64 kSlowestBody = 1024;
+
+/// Of an answer that needs no body.
+class LetGo : public BodySink
+{
+public:
+    LetGo(Response response, qint64 most)
+        : mResponse(std::move(response))
+        , mLeft(most)
+    {
+    }
+
+    bool take(const char* /*bytes*/, int size) override
+    {
+        mLeft -= size;
+        return mLeft >= 0;
+    }
+    Response answer() override
+    {
+        return mLeft >= 0 ? std::move(mResponse) : failure(413, QStringLiteral("The body is too large"));
+    }
+
+private:
+    Response mResponse;
+    qint64 mLeft;
+};
+
+}  // namespace
+
+/// On a worker. What was answered before the body tells what to do with that.
+void Session::beginBody(Response response)
+{
+    mSink = std::move(response.sink);
+    mHeaders = mSink != nullptr ? response.headers : QVector<Field>();
+    // Nobody has to send what is refused already.
+    if (mSink == nullptr && response.status >= 400) {
+        endBody(std::move(response), Afterwards::Close);
+        return;
+    }
+    if (mSink == nullptr)
+        mSink = std::make_unique<LetGo>(std::move(response), mHost.settings.bodyBytes);
+    mBodyBegan = Clock::now();
+    mBodyBytes = 0;
+    receiveBody();
+}
+
+void Session::receiveBody()
+{
+    try {
+        takeBody();
+    } catch (const std::exception& fault) {
+        LogFile::errorf("Request %s failed: %s", mRequest.id.constData(), fault.what());
+        endBody(failure(500, QStringLiteral("The request failed")), Afterwards::Close);
+    }
+}
+
+/// On a worker, for the sink may wait for disks. Nothing is read from the client before the sink has taken what was there.
+void Session::takeBody()
+{
+    QByteArray block(kBodyBlock, Qt::Uninitialized);
+    for (int i = 0; i < kBlocksPerTurn; ++i) {
+        int count = 0;
+        switch (mReader.readBody(block.data(), block.size(), count)) {
+        case RequestReader::Body::Block:
+            mBodyBytes += count;
+            if (!mSink->take(block.constData(), count)) {
+                endBody(mSink->answer(), Afterwards::Close);
+                return;
+            }
+            continue;
+        case RequestReader::Body::End:
+            endBody(mSink->answer(), Afterwards::Stay);
+            return;
+        case RequestReader::Body::Malformed:
+            endBody(failure(400, QStringLiteral("The body is not sent as HTTP/1.1 has it")),
+                    Afterwards::Close);
+            return;
+        case RequestReader::Body::AwaitsLeave:
+            tellToGoOn();
+            [[fallthrough]];
+        case RequestReader::Body::Awaited:
+            break;
+        }
+        const Transport::Outcome outcome = mTransport->read(block.data(), block.size(), count);
+        if (outcome == Transport::Outcome::Done) {
+            mReader.add(block.constData(), count);
+        } else if (outcome == Transport::Outcome::WantsRead) {
+            mConnection->post([self = shared_from_this()] { self->awaitBody(); });
+            return;
+        } else {
+            mConnection->post([self = shared_from_this()] {
+                self->mIsWithWorker = false;
+                self->close();
+            });
+            return;
+        }
+    }
+    mHost.workers.run([self = shared_from_this()] { self->receiveBody(); });
+}
+
+/// Back on the thread of the I/O.
+void Session::awaitBody()
+{
+    mIsWithWorker = false;
+    if (isTooSlow()) {
+        expire();
+        return;
+    }
+    mDeadline = Clock::now() + mHost.settings.patience;
+    mConnection->wait(Connection::For::Reading, mDeadline,
+                      [self = shared_from_this()](Connection::Waited waited) {
+                          if (waited == Connection::Waited::Expired) {
+                              self->expire();
+                          } else if (waited == Connection::Waited::Ready) {
+                              self->mIsWithWorker = true;
+                              self->mHost.workers.run([self] { self->receiveBody(); });
+                          }
+                      });
+}
+
+bool Session::isTooSlow() const
+{
+    using Seconds = std::chrono::duration<double>;
+    const Clock::duration time = Clock::now() - mBodyBegan;
+    return time > mHost.settings.patience &&
+           static_cast<double>(mBodyBytes) < Seconds(time).count() * kSlowestBody;
+}
+
+void Session::endBody(Response response, Afterwards afterwards)
+{
+    mSink.reset();
+    response.headers += mHeaders;
+    // From here on the client waits.
+    mBegan = Clock::now();
+    mIsRefused = afterwards == Afterwards::Close;
+    write(std::move(response));
+}
+
+}  // namespace Kdd::Http

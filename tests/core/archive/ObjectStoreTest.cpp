@@ -1,0 +1,253 @@
+#include "kddlib/archive/ObjectStore.h"
+
+#include "kddlib/archive/ArrivedStudies.h"
+#include "kddlib/tagfile/TagFile.h"
+#include "platform/database/Catalogue.h"
+#include "platform/database/Kxg.h"
+#include "support/DatasetBuilder.h"
+#include "support/FileContent.h"
+#include "support/LogCapture.h"
+#include "support/Process.h"
+#include "support/TemporaryStore.h"
+
+#include <QDir>
+#include <QDirIterator>
+
+#include <gtest/gtest.h>
+
+#include <thread>
+
+using namespace Kdd;
+
+namespace
+{
+
+class ObjectStoreTest : public testing::Test
+{
+protected:
+    ObjectStoreTest()
+    {
+        Kxg::SetDatabaseServer(mAddress);
+        mRules.folder = mFolder.filePath("objects").toUtf8();
+        mRules.freeBytes = 0;
+    }
+
+    std::unique_ptr<Kxg::Catalogue> catalogue() const
+    {
+        Result result;
+        auto opened = Kxg::Catalogue::open(mAddress, result);
+        EXPECT_TRUE(result.good()) << result.text().toStdString();
+        return opened;
+    }
+
+    std::unique_ptr<ObjectStore> open(ArrivedStudies& studies) const
+    {
+        Result result;
+        auto store = ObjectStore::open(mRules, studies, result);
+        EXPECT_TRUE(result.good()) << result.text().toStdString();
+        return store;
+    }
+
+    static QByteArray fileOf(const DatasetBuilder& image)
+    {
+        QTemporaryDir folder;
+        const QString path = folder.filePath(QStringLiteral("a"));
+        DcmDataset copy(image.build());
+        DcmFileFormat format(&copy);
+        EXPECT_TRUE(format.saveFile(path.toUtf8().constData(), EXS_LittleEndianExplicit).good());
+        return fileContent(path);
+    }
+
+    static ArrivedObject store(ObjectStore& store, Kxg::Catalogue& catalogue, const DatasetBuilder& image)
+    {
+        std::vector<std::unique_ptr<ObjectArrival>> arrivals;
+        arrivals.push_back(store.begin());
+        const QByteArray bytes = fileOf(image);
+        arrivals[0]->take(bytes.constData(), bytes.size());
+        arrivals[0]->end();
+        return store.commit(arrivals, catalogue).at(0);
+    }
+
+    QStringList filesBelow(const char* folder) const
+    {
+        QStringList names;
+        QDirIterator files(mFolder.filePath(folder), QDir::Files | QDir::Hidden,
+                           QDirIterator::Subdirectories);
+        while (files.hasNext())
+            names.append(files.next().mid(mFolder.filePath(folder).size() + 1));
+        names.sort();
+        return names;
+    }
+
+    std::string waiting() const
+    {
+        QVector<QByteArray> studies;
+        EXPECT_TRUE(catalogue()->waitingStudies(mRules.folder, studies).good());
+        return studies.toList().join(' ').toStdString();
+    }
+
+    LogCapture mLog;
+    TemporaryStore mFolder;
+    QByteArray mAddress = "sqlite:" + mFolder.filePath("kdd.sqlite").toUtf8();
+    ObjectRules mRules;
+};
+
+TEST_F(ObjectStoreTest, LeavesAStudyThatWaitsAndCompletesIt)
+{
+    ArrivedStudies studies({std::chrono::milliseconds(0), std::chrono::milliseconds(0)});
+    const auto database = catalogue();
+    const auto objects = open(studies);
+    for (const char* uid : {"1.2.3.1", "1.2.3.2"})
+        EXPECT_EQ(store(*objects, *database, anImage(uid)).reason.toStdString(), "");
+    EXPECT_EQ(waiting(), "1.2");
+    QByteArray due;
+    ASSERT_TRUE(studies.awaitDue(due));
+    EXPECT_EQ(due, "1.2");
+    ASSERT_TRUE(studies.complete(due, *database, 0).good());
+    EXPECT_FALSE(studies.isWaiting("1.2"));
+    EXPECT_EQ(waiting(), "");
+    TagFile file;
+    ASSERT_TRUE(file.readCacheFileForStudy("1.2", false));
+    EXPECT_EQ(file.imagesByUID().keys(), (QList<QByteArray>{"1.2.3.1", "1.2.3.2"}));
+    EXPECT_EQ(filesBelow("objects/1.2"),
+              (QStringList{QStringLiteral("1.2.3/1.2.3.1.dcm"), QStringLiteral("1.2.3/1.2.3.2.dcm")}));
+}
+
+TEST_F(ObjectStoreTest, MergesArrivalsWithoutOpeningTheirFilesAgain)
+{
+    ArrivedStudies studies;
+    const auto database = catalogue();
+    const auto objects = open(studies);
+    store(*objects, *database, anImage("1.2.3.1"));
+    ASSERT_TRUE(studies.complete("1.2", *database, 0).good());
+    store(*objects, *database, anImage("1.2.3.2"));
+    store(*objects, *database, anImage("1.2.3.3"));
+    // A build would miss them.
+    QDir(mFolder.filePath("objects/1.2")).removeRecursively();
+    ASSERT_TRUE(studies.complete("1.2", *database, 0).good());
+    TagFile file;
+    ASSERT_TRUE(file.readCacheFileForStudy("1.2", false));
+    EXPECT_EQ(file.imagesByUID().size(), 3);
+}
+
+TEST_F(ObjectStoreTest, TakesWhatTwoSendInOppositeOrderOnce)
+{
+    ArrivedStudies studies;
+    const auto objects = open(studies);
+    catalogue();
+    const auto send = [&](bool isReversed) {
+        std::vector<std::unique_ptr<ObjectArrival>> arrivals;
+        for (int i = 0; i < 40; ++i) {
+            // Each twice, too.
+            const int number = (isReversed ? 39 - i : i) / 2;
+            const QByteArray bytes = fileOf(anImage(("1.2.3." + QByteArray::number(number)).constData()));
+            arrivals.push_back(objects->begin());
+            arrivals.back()->take(bytes.constData(), bytes.size());
+        }
+        for (const ArrivedObject& object : objects->commit(arrivals, *catalogue()))
+            EXPECT_TRUE(object.isStored()) << object.reason.toStdString();
+    };
+    std::thread other([&] { send(true); });
+    send(false);
+    other.join();
+    EXPECT_EQ(filesBelow("objects/1.2").size(), 20);
+}
+
+TEST_F(ObjectStoreTest, LeavesAloneWhatAnotherProcessCompletes)
+{
+    ArrivedStudies studies;
+    const auto database = catalogue();
+    const auto objects = open(studies);
+    store(*objects, *database, anImage("1.2.3.1"));
+    {
+        const auto other = catalogue();
+        std::unique_ptr<Kxg::StudyClaim> claim;
+        ASSERT_TRUE(other->claim("1.2", 0, claim).good());
+        EXPECT_TRUE(studies.complete("1.2", *database, 10).bad());
+        EXPECT_TRUE(studies.isWaiting("1.2"));
+    }
+    EXPECT_TRUE(studies.complete("1.2", *database, 0).good());
+    EXPECT_FALSE(studies.isWaiting("1.2"));
+}
+
+TEST_F(ObjectStoreTest, TakesInOrRemovesWhatAServerLeftThatDied)
+{
+    // One is half received, one has its place and is not registered, one is registered.
+    EXPECT_EQ(inChild([&] {
+                  ArrivedStudies studies;
+                  const auto objects = open(studies);
+                  const auto half = objects->begin();
+                  half->take("half", 4);
+                  const auto database = catalogue();
+                  store(*objects, *database, anImage("1.2.3.1"));
+                  ::raise(SIGKILL);
+                  return false;
+              }),
+              -SIGKILL);
+    const QString staging = filesBelow("objects/.incoming").filter(QStringLiteral("/life")).value(0).left(32);
+    const QString left = mFolder.filePath("objects/.incoming/") + staging;
+    const QString series = mFolder.filePath("objects/1.2/1.2.3/");
+    putFile(left + QStringLiteral("/77"), fileOf(anImage("1.2.3.2")));
+    ASSERT_EQ(::link((left + QStringLiteral("/77")).toUtf8().constData(),
+                     (series + QStringLiteral("1.2.3.2.dcm")).toUtf8().constData()),
+              0);
+    ASSERT_EQ(::link((series + QStringLiteral("1.2.3.1.dcm")).toUtf8().constData(),
+                     (left + QStringLiteral("/78")).toUtf8().constData()),
+              0);
+    // Something newer of its UID came while it lay there.
+    putFile(left + QStringLiteral("/79"), fileOf(anImage("1.2.3.1").with(DCM_PatientName, "Older")));
+    ASSERT_EQ(::link((left + QStringLiteral("/79")).toUtf8().constData(),
+                     (series + QStringLiteral("1.2.3.1_0002.dcm")).toUtf8().constData()),
+              0);
+
+    ArrivedStudies studies;
+    const auto database = catalogue();
+    const auto objects = open(studies);
+    const auto arriving = objects->begin();
+    ASSERT_TRUE(objects->recover(*database).good());
+    EXPECT_FALSE(QDir(left).exists());
+    EXPECT_EQ(filesBelow("objects/1.2"),
+              (QStringList{QStringLiteral("1.2.3/1.2.3.1.dcm"), QStringLiteral("1.2.3/1.2.3.2.dcm")}));
+    Kxg::StudyContents contents;
+    ASSERT_TRUE(database->studyContents("1.2", contents).good());
+    EXPECT_EQ(contents.images.size(), 2U);
+    EXPECT_TRUE(arriving->take("more", 4)) << "what still lives is left alone";
+}
+
+TEST_F(ObjectStoreTest, TellsThatTheDiskIsFullAndLeavesNothing)
+{
+    ArrivedStudies studies;
+    const auto database = catalogue();
+    const auto objects = open(studies);
+    const DatasetBuilder large = anImage("1.2.3.1").words(std::vector<Uint16>(100000, 7));
+    const QByteArray bytes = fileOf(large);
+    {
+        std::vector<std::unique_ptr<ObjectArrival>> arrivals;
+        arrivals.push_back(objects->begin());
+        const FullDisk full(50000);
+        EXPECT_FALSE(arrivals[0]->take(bytes.constData(), bytes.size()));
+        EXPECT_EQ(objects->commit(arrivals, *database).at(0).fault, ArrivalFault::OutOfSpace);
+    }
+    EXPECT_FALSE(QDir(mFolder.filePath("objects/1.2")).exists());
+    EXPECT_EQ(filesBelow("objects/.incoming").filter(QStringLiteral("/1")), QStringList());
+    EXPECT_TRUE(store(*objects, *database, large).isStored());
+    mRules.freeBytes = qint64(1) << 60;
+    const auto careful = open(studies);
+    EXPECT_FALSE(careful->hasRoom());
+    EXPECT_EQ(store(*careful, *database, anImage("1.2.3.2")).fault, ArrivalFault::OutOfSpace);
+}
+
+TEST_F(ObjectStoreTest, ReplacesWhatCannotBeReadAnyMore)
+{
+    ArrivedStudies studies;
+    const auto database = catalogue();
+    const auto objects = open(studies);
+    store(*objects, *database, anImage("1.2.3.1"));
+    putFile(mFolder.filePath("objects/1.2/1.2.3/1.2.3.1.dcm"), "spoilt");
+    EXPECT_TRUE(store(*objects, *database, anImage("1.2.3.1")).isStored());
+    QVector<Kxg::KeptFile> files;
+    ASSERT_TRUE(database->imageFiles("1.2", "1.2.3.1", files).good());
+    EXPECT_TRUE(files.value(0).path.endsWith("/1.2.3.1_0002.dcm") && files.value(0).isShown);
+}
+
+}  // namespace

@@ -1,0 +1,98 @@
+#include "server/faults/Served.h"
+#include "support/PostgresServer.h"
+
+using namespace Kdd;
+
+namespace
+{
+
+enum class Engine { Sqlite, Postgres };
+
+class DatabaseFaults : public Served, public testing::WithParamInterface<Engine>
+{
+protected:
+    DatabaseFaults()
+        : mDatabase("KDD_DATABASE", GetParam() == Engine::Sqlite
+                                        ? "sqlite:" + path("store/kdd.sqlite").toStdString()
+                                        : newPostgresDatabase().toStdString())
+    {
+    }
+
+    void takeAway() const
+    {
+        if (GetParam() == Engine::Postgres)
+            return stopPostgres();
+        ASSERT_TRUE(QFile::rename(path("store/kdd.sqlite"), path("store/away")));
+    }
+
+    void bringBack() const
+    {
+        if (GetParam() == Engine::Postgres)
+            return startPostgres();
+        ASSERT_TRUE(QFile::rename(path("store/away"), path("store/kdd.sqlite")));
+    }
+
+    /// What each of the server's threads answers to a search.
+    void expectOfAll(int status) const
+    {
+        onThreads(8, [&](int) {
+            for (int i = 0; i < 4; ++i) {
+                const Reply reply = get("studies");
+                EXPECT_EQ(reply.status, status);
+                EXPECT_EQ(reply.body.contains("kdd"), false) << "no address: " << reply.body.toStdString();
+                EXPECT_FALSE(reply.body.isEmpty());
+            }
+        });
+    }
+
+    Setting mDatabase;
+};
+
+INSTANTIATE_TEST_SUITE_P(Engines, DatabaseFaults, testing::Values(Engine::Sqlite, Engine::Postgres),
+                         [](const auto& engine) {
+                             return engine.param == Engine::Sqlite ? std::string("Sqlite")
+                                                                   : std::string("Postgres");
+                         });
+
+TEST_P(DatabaseFaults, AreToldAndPassByThemselves)
+{
+    addTwoStudies();
+    serve({QStringLiteral("--threads"), QStringLiteral("4")});
+    expectOfAll(200);
+    const qint64 descriptors = openDescriptors();
+    for (int round = 0; round < 3; ++round) {
+        takeAway();
+        expectOfAll(503);
+        EXPECT_EQ(status("/readyz").status, 503);
+        EXPECT_EQ(get("studies/1.2/metadata").status, 200) << "of the tag file alone";
+        bringBack();
+        expectOfAll(200);
+        EXPECT_EQ(status("/readyz").status, 200);
+    }
+    ASSERT_TRUE(hasNoConnections());
+    // The threads that answer watchers may have opened theirs.
+    EXPECT_LE(openDescriptors(), descriptors + 4 * 3) << "connections are given back";
+    EXPECT_EQ(end(), 0);
+}
+
+class DatabaseFile : public Served
+{
+};
+
+TEST_F(DatabaseFile, ThatIsPutInPlaceOfAnotherIsFollowed)
+{
+    addTwoStudies();
+    serve({QStringLiteral("--threads"), QStringLiteral("1")});
+    EXPECT_TRUE(get("studies").body.contains("\"1.2\""));
+    // As an older copy is put back.
+    for (const char* name : {"store/kdd.sqlite", "store/kdd.sqlite-wal", "store/kdd.sqlite-shm"})
+        QFile::remove(path(name));
+    for (const char* name : {"1", "2", "3"})
+        QFile::remove(file(name));
+    EXPECT_EQ(addImages().exitCode, 0);
+    const QByteArray studies = get("studies").body;
+    EXPECT_FALSE(studies.contains("\"1.2\"")) << studies.toStdString();
+    EXPECT_TRUE(studies.contains("\"1.3\""));
+}
+
+}  // namespace

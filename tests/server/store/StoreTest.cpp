@@ -1,0 +1,320 @@
+#include "server/Server.h"
+#include "server/http/Client.h"
+#include "support/DatasetBuilder.h"
+#include "support/FileContent.h"
+#include "support/LogCapture.h"
+#include "support/TemporaryStore.h"
+
+#include <QDir>
+#include <QDirIterator>
+#include <QJsonArray>
+#include <QJsonDocument>
+#include <QJsonObject>
+
+#include <gtest/gtest.h>
+#include <kddlib/Kxg.h>
+#include <kddlib/QAData.h>
+#include <kddlib/StudyChange.h>
+#include <kddlib/TagFile.h>
+
+#include <thread>
+
+using namespace Kdd;
+
+namespace
+{
+
+const QByteArray kType = "multipart/related; type=\"application/dicom\"; boundary=cut";
+
+/// A server that takes objects, over a store of its own.
+class StoreTest : public testing::Test
+{
+protected:
+    StoreTest()
+    {
+        Kxg::SetDatabaseServer("sqlite:" + mStore.filePath("kdd.sqlite").toUtf8());
+        mSettings.http.address = {"127.0.0.1", 0};
+        mSettings.objects.emplace();
+        mSettings.objects->folder = mStore.filePath("objects").toUtf8();
+        mSettings.objects->freeBytes = 0;
+    }
+
+    void start()
+    {
+        Result result;
+        mServer.reset();
+        mServer = Server::make(mSettings, result);
+        ASSERT_NE(mServer, nullptr) << result.text().toStdString();
+        ASSERT_TRUE(mServer->start().good());
+    }
+
+    /// The bytes of a file of it.
+    QByteArray fileOf(const DatasetBuilder& image) const
+    {
+        const QByteArray path = mStore.filePath("sent.dcm").toUtf8();
+        DcmDataset copy(image.build());
+        DcmFileFormat format(&copy);
+        EXPECT_TRUE(format.saveFile(path.constData(), EXS_LittleEndianExplicit).good());
+        return fileContent(QString::fromUtf8(path));
+    }
+
+    static QByteArray partOf(const QByteArray& object, const QByteArray& type = "application/dicom")
+    {
+        return "--cut\r\nContent-Type: " + type + "\r\n\r\n" + object + "\r\n";
+    }
+
+    Reply post(const QByteArray& body, const QByteArray& path = "/studies", const QByteArray& type = kType,
+               const QByteArray& headers = {}) const
+    {
+        Client client(mServer->address());
+        client.send("POST /dicom-web" + path + " HTTP/1.1\r\nHost: localhost\r\nContent-Type: " + type +
+                    "\r\nContent-Length: " + QByteArray::number(body.size()) + "\r\n" + headers + "\r\n" +
+                    body);
+        return client.reply();
+    }
+
+    Reply store(const DatasetBuilder& image, const QByteArray& path = "/studies") const
+    {
+        return post(partOf(fileOf(image)) + "--cut--", path);
+    }
+
+    Reply get(const QByteArray& path) const
+    {
+        Client client(mServer->address());
+        client.get("/dicom-web" + path);
+        return client.reply();
+    }
+
+    /// "1.2.3.1" for each that is stored, "1.2.3.1:0111" for one that is not, ":C000" for one without name.
+    static std::string told(const Reply& reply)
+    {
+        QStringList lines;
+        const QJsonObject report = QJsonDocument::fromJson(reply.body).object();
+        const auto add = [&](const char* sequence) {
+            const QJsonValue items =
+                report.value(QLatin1String(sequence)).toObject().value(QLatin1String("Value"));
+            for (const QJsonValue& item : items.toArray()) {
+                const auto first = [&](const char* key) {
+                    return item.toObject()
+                        .value(QLatin1String(key))
+                        .toObject()
+                        .value(QLatin1String("Value"))[0];
+                };
+                const int reason = first("00081197").toInt();
+                lines.append(first("00081155").toString() +
+                             (reason == 0
+                                  ? QString()
+                                  : QStringLiteral(":%1").arg(reason, 4, 16, QLatin1Char('0')).toUpper()));
+            }
+        };
+        for (const char* sequence : {"00081199", "00081198", "0008119A"})
+            add(sequence);
+        return (QString::number(reply.status) + QLatin1Char(' ') + lines.join(QLatin1Char(' ')))
+            .toStdString();
+    }
+
+    int filesBelowObjects() const
+    {
+        int count = 0;
+        QDirIterator files(mStore.filePath("objects"), {QStringLiteral("*.dcm")}, QDir::Files,
+                           QDirIterator::Subdirectories);
+        for (; files.hasNext(); files.next())
+            ++count;
+        return count;
+    }
+
+    int instances(const QByteArray& study) const
+    {
+        return QJsonDocument::fromJson(get("/studies/" + study + "/instances").body).array().size();
+    }
+
+    LogCapture mLog;
+    TemporaryStore mStore;
+    ServerSettings mSettings;
+    std::unique_ptr<Server> mServer;
+};
+
+TEST_F(StoreTest, WhatIsToldStoredIsFoundAndRetrievedAtOnce)
+{
+    start();
+    for (int i = 1; i <= 5; ++i) {
+        const QByteArray uid = "1.2.3." + QByteArray::number(i);
+        const QByteArray object = fileOf(anImage(uid.constData()).with(DCM_PatientName, "Doe^J"));
+        const Reply reply = post(partOf(object) + "--cut--");
+        EXPECT_EQ(told(reply), "200 " + uid.toStdString());
+        EXPECT_EQ(reply.header("Content-Type"), "application/dicom+json");
+        const QByteArray path = "/studies/1.2/series/1.2.3/instances/" + uid;
+        EXPECT_TRUE(reply.body.contains("/dicom-web" + path + '"')) << reply.body.constData();
+        EXPECT_EQ(get(path + "?accept=application/dicom;transfer-syntax=*").status, 200);
+        EXPECT_EQ(instances("1.2"), i);
+        EXPECT_EQ(get(path + "/metadata").status, 200);
+    }
+    EXPECT_TRUE(get("/studies?PatientName=doe*").body.contains("\"1.2\""));
+    EXPECT_EQ(filesBelowObjects(), 5);
+}
+
+TEST_F(StoreTest, TellsOfEachPartWhatBecameOfIt)
+{
+    start();
+    const QByteArray good = fileOf(anImage("1.2.3.1"));
+    QByteArray mismatch = good;
+    mismatch.replace(mismatch.indexOf("1.2.3.1"), 7, "1.2.3.9");  // in the meta information
+    QByteArray cut = fileOf(anImage("1.2.3.2").words(std::vector<Uint16>(500, 7)));
+    cut.chop(600);
+    const QByteArray body = partOf(good) + partOf("no DICOM") + partOf("") + partOf(mismatch) + partOf(cut) +
+                            partOf(fileOf(anImage("../../x"))) +
+                            partOf(fileOf(anImage("1.2.3.3").inStudy(""))) +
+                            partOf(good, "application/json") + partOf(fileOf(anImage("1.2.3.4"))) + "--cut--";
+    const Reply reply = post(body);
+    EXPECT_EQ(told(reply),
+              "202 1.2.3.1 1.2.3.4 1.2.3.1:A900 1.2.3.2:C000 1.2.3.3:C000 :C000 :C000 :C000 :C000")
+        << reply.body.constData();
+    EXPECT_EQ(instances("1.2"), 2);
+    EXPECT_EQ(filesBelowObjects(), 2);
+    EXPECT_EQ(told(post(partOf("no DICOM") + "--cut--")), "409 :C000");
+    EXPECT_EQ(told(store(anImage("1.2.3.5"), "/studies/1.9")), "409 1.2.3.5:C001");
+    EXPECT_EQ(told(store(anImage("1.2.3.5"), "/studies/1.2")), "200 1.2.3.5");
+}
+
+TEST_F(StoreTest, TakesAnObjectOnceHoweverOftenItComes)
+{
+    start();
+    const QByteArray object = fileOf(anImage("1.2.3.1"));
+    std::vector<std::thread> senders;
+    std::vector<std::string> answers(8);
+    for (std::string& answer : answers)
+        senders.emplace_back([&] { answer = told(post(partOf(object) + "--cut--")); });
+    for (std::thread& sender : senders)
+        sender.join();
+    for (const std::string& answer : answers)
+        EXPECT_EQ(answer, "200 1.2.3.1");
+    // Another sender writes meta information of its own.
+    QByteArray sentOn = object;
+    sentOn[5] = 'x';
+    EXPECT_EQ(told(post(sentOn, "/studies", "application/dicom")), "200 1.2.3.1");
+    EXPECT_EQ(instances("1.2"), 1);
+    EXPECT_EQ(filesBelowObjects(), 1);
+}
+
+TEST_F(StoreTest, FollowsTheRuleForOtherContentOfTheSameUid)
+{
+    start();
+    EXPECT_EQ(told(store(anImage("1.2.3.1").with(DCM_PatientName, "First"))), "200 1.2.3.1");
+    EXPECT_EQ(told(store(anImage("1.2.3.1").with(DCM_PatientName, "Second"))), "409 1.2.3.1:0111");
+    EXPECT_TRUE(get("/studies/1.2/metadata").body.contains("First"));
+    mSettings.objects->sameUid = SameUid::Replace;
+    start();
+    EXPECT_EQ(told(store(anImage("1.2.3.1").with(DCM_PatientName, "Second"))), "200 1.2.3.1");
+    EXPECT_TRUE(get("/studies/1.2/metadata").body.contains("Second"));
+    EXPECT_EQ(filesBelowObjects(), 2) << "what was there stays";
+    EXPECT_EQ(told(store(anImage("1.2.3.1").with(DCM_PatientName, "First"))), "200 1.2.3.1");
+    EXPECT_TRUE(get("/studies/1.2/metadata").body.contains("First"));
+    EXPECT_EQ(filesBelowObjects(), 2);
+    EXPECT_EQ(instances("1.2"), 1);
+}
+
+TEST_F(StoreTest, KeepsCorrectionsOfWhatComesAgain)
+{
+    start();
+    const DatasetBuilder image = anImage("1.2.3.1").with(DCM_PatientName, "Wrong^Name");
+    store(image);
+    ASSERT_EQ(instances("1.2"), 1);
+    QAData job;
+    job.studyUID = "1.2";
+    job.images = {"1.2.3.1"};
+    job.substitutions = {{DCM_PatientName, QStringLiteral("Right^Name")}};
+    ASSERT_TRUE(StudyChange::correct(job).good());
+    EXPECT_EQ(told(store(image)), "200 1.2.3.1");
+    EXPECT_EQ(told(store(anImage("1.2.3.2"))), "200 1.2.3.2");
+    EXPECT_EQ(instances("1.2"), 2);
+    const QByteArray shown = get("/studies/1.2/metadata").body;
+    EXPECT_TRUE(shown.contains("Right^Name") && !shown.contains("Wrong^Name")) << shown.constData();
+}
+
+TEST_F(StoreTest, LeadsWhatComesAgainToWhereItWasMoved)
+{
+    start();
+    store(anImage("1.2.3.1"));
+    store(anImage("1.2.3.2"));
+    ASSERT_EQ(instances("1.2"), 2);
+    QAData job;
+    job.studyUID = "1.5";
+    job.oldStudyUID = "1.2";
+    job.images = {"1.2.3.1"};
+    job.substitutions = {{DCM_StudyInstanceUID, QStringLiteral("1.5")}};
+    ASSERT_TRUE(StudyChange::correct(job).good());
+    for (const char* name : {"", "Other"}) {
+        mSettings.objects->sameUid = SameUid::Replace;
+        start();
+        const Reply again = store(anImage("1.2.3.1").with(DCM_PatientName, name));
+        EXPECT_EQ(told(again), "200 1.2.3.1");
+        EXPECT_TRUE(again.body.contains("/studies/1.5/series/")) << again.body.constData();
+        EXPECT_EQ(instances("1.2"), 1);
+        EXPECT_EQ(instances("1.5"), 1);
+    }
+}
+
+TEST_F(StoreTest, TakesBackWhatWasRemoved)
+{
+    start();
+    store(anImage("1.2.3.1"));
+    ASSERT_EQ(instances("1.2"), 1);
+    Result result;
+    const auto catalogue = Kxg::Catalogue::open(Kxg::DatabaseServer(), result);
+    ASSERT_TRUE(StudyChange(*catalogue).remove({"1.2", {}, {}}).good());
+    EXPECT_EQ(instances("1.2"), 0);
+    EXPECT_EQ(told(store(anImage("1.2.3.1").with(DCM_PatientName, "Other"))), "200 1.2.3.1");
+    EXPECT_EQ(instances("1.2"), 1);
+    EXPECT_TRUE(get("/studies/1.2/metadata").body.contains("Other"));
+}
+
+TEST_F(StoreTest, AnswersWhatItCannotTakeBeforeItComes)
+{
+    mSettings.store.requestBytes = 100000;
+    mSettings.store.parts = 3;
+    mSettings.objects->objectBytes = 50000;
+    start();
+    const QByteArray part = partOf(fileOf(anImage("1.2.3.1")));
+    EXPECT_EQ(post(part, "/studies", "multipart/form-data; boundary=cut").status, 415);
+    EXPECT_EQ(
+        post(part, "/studies", "multipart/related; type=\"application/dicom+json\"; boundary=cut").status,
+        415);
+    EXPECT_EQ(post(part, "/studies", "multipart/related; type=\"application/dicom\"").status, 400);
+    EXPECT_EQ(post(part, "/studies", kType, "Accept: text/html\r\n").status, 406);
+    EXPECT_EQ(post(part, "/studies/1.2/series").status, 405);
+    EXPECT_EQ(post("nothing of it").status, 400);
+    EXPECT_EQ(told(post(part + part.left(part.size() - 20))), "202 1.2.3.1 :C000") << "the end is missing";
+    EXPECT_EQ(told(post(part)), "400 :C000") << "nothing tells that it is whole";
+    EXPECT_EQ(told(post(partOf(QByteArray(60000, 'x')) + "--cut--")), "409 :A700");
+    EXPECT_EQ(post(QByteArray(120000, 'x')).status, 400) << "not even a part";
+    EXPECT_EQ(told(post(partOf(QByteArray(49000, 'x')) + partOf(QByteArray(60000, 'x')) + "--cut--")),
+              "413 :C000 :A700");
+    EXPECT_EQ(told(post(part.repeated(4) + "--cut--")), "202 1.2.3.1 1.2.3.1 1.2.3.1");
+    mSettings.objects->freeBytes = qint64(1) << 60;
+    start();
+    const Reply full = post(part);
+    EXPECT_EQ(full.status, 503);
+    EXPECT_EQ(full.header("Retry-After"), "60");
+}
+
+TEST_F(StoreTest, TellsInXmlToWhomWantsThat)
+{
+    start();
+    const Reply reply = post(partOf(fileOf(anImage("1.2.3.1"))) + "--cut--", "/studies", kType,
+                             "Accept: application/dicom+xml\r\n");
+    EXPECT_EQ(reply.header("Content-Type"), "application/dicom+xml");
+    EXPECT_TRUE(
+        reply.body.contains("<DicomAttribute tag=\"00081199\" vr=\"SQ\" keyword=\"ReferencedSOPSequence\">"
+                            "<Item number=\"1\">"))
+        << reply.body.constData();
+    EXPECT_TRUE(reply.body.contains("<Value number=\"1\">1.2.3.1</Value>"));
+}
+
+TEST_F(StoreTest, TakesNothingUnlessItIsToldTo)
+{
+    mSettings.objects.reset();
+    start();
+    EXPECT_EQ(store(anImage("1.2.3.1")).status, 405);
+}
+
+}  // namespace
