@@ -60,11 +60,11 @@ bool hasHeader(const Http::Response& response, const char* name)
 
 }  // namespace
 
-AccessGate::AccessGate(const AccessRules& rules, const RightsTable& table, const QVector<QByteArray>& proxies,
+AccessGate::AccessGate(const AccessRules& rules, RightsTable table, QVector<QByteArray> proxies,
                        Http::Handler& inner)
     : mRules(rules)
-    , mTable(table)
-    , mProxies(proxies)
+    , mTable(std::move(table))
+    , mProxies(std::move(proxies))
     , mOrigins(rules.origins)
     , mTokens(rules.tokens ? std::make_unique<TokenCheck>(*rules.tokens) : nullptr)
     , mInner(inner)

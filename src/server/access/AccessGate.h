@@ -13,7 +13,7 @@ class AccessGate : public Http::Handler
 public:
     /// `proxies` are the numeric addresses from which tokens are taken although the last part of their way is not
     /// encrypted. `inner` outlives this.
-    AccessGate(const AccessRules& rules, const RightsTable& table, const QVector<QByteArray>& proxies,
+    AccessGate(const AccessRules& rules, RightsTable table, QVector<QByteArray> proxies,
                Http::Handler& inner);
     ~AccessGate() override;
 

@@ -29,9 +29,9 @@ const struct
 class Section
 {
 public:
-    Section(const QJsonValue& value, const QString& name, Result& result)
+    Section(const QJsonValue& value, QString name, Result& result)
         : mObject(value.toObject())
-        , mName(name)
+        , mName(std::move(name))
         , mResult(result)
     {
         if (!value.isObject())
@@ -57,7 +57,8 @@ public:
     {
         const QJsonValue value = take(name);
         QVector<QString> list;
-        for (const QJsonValue& item : value.isArray() ? value.toArray() : QJsonArray{value}) {
+        const QJsonArray items = value.isArray() ? value.toArray() : QJsonArray{value};
+        for (const QJsonValue item : items) {
             list.append(item.toString());
             if (item.toString().isEmpty())
                 fail(name, "has something that is no text, or empty");
@@ -115,7 +116,8 @@ private:
     Rights rightsOf(const QJsonValue& value, const char* name)
     {
         Rights rights;
-        for (const QJsonValue& item : value.toArray()) {
+        const QJsonArray items = value.toArray();
+        for (const QJsonValue item : items) {
             const auto* const found =
                 std::find_if(std::begin(kRights), std::end(kRights),
                              [&](const auto& each) { return item.toString() == QLatin1String(each.name); });
@@ -161,7 +163,7 @@ TokenRules readTokens(Section section, Result& result)
         section.fail("keysKept", "is less than keysAge");
     made.subject = section.text("subject", made.subject);
     const QJsonArray rules = section.take("rights").toArray();
-    for (const QJsonValue& rule : rules)
+    for (const QJsonValue rule : rules)
         made.rights.append(readClaimRule(Section(rule, section.path("rights"), result)));
     if (rules.isEmpty())
         section.fail("rights", "is no list of rules: no token would give anything");

@@ -44,10 +44,8 @@ constexpr struct
     const char* kind;
     bool isOpen;
 } kPages[] = {
-    {"", "page", true},
-    {"page", "page", true},
-    {"viewer", "viewer", true},
-    {"browser", "browser", false},
+    {"", "page", true},         {"page", "page", true},
+    {"viewer", "viewer", true}, {"browser", "browser", false},
     {"wado", "wado", false},
 };
 

@@ -16,7 +16,8 @@ int membersOf(const QJsonValue& value)
         for (auto member = object.begin(); member != object.end(); ++member)
             count += 1 + membersOf(member.value());
     } else if (value.isArray()) {
-        for (const QJsonValue& item : value.toArray())
+        const QJsonArray items = value.toArray();
+        for (const QJsonValue item : items)
             count += membersOf(item);
     }
     return count;

@@ -328,7 +328,7 @@ void Session::reportBrokenOff()
     mSink.reset();
     --mHost.inFlight;
     const auto duration = std::chrono::duration_cast<std::chrono::microseconds>(Clock::now() - mBegan);
-    mHost.observer.ended({mRequest, 400, 0, duration, false, {}});
+    mHost.observer.ended({mRequest, mCaller, 400, 0, duration, false, {}});
     mRequest = {};
 }
 

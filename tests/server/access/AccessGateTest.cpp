@@ -217,7 +217,7 @@ TEST_F(AccessGateTest, TellsWhatIsWrongWithATokenAndNothingOfIt)
     tokens.rights = {{QStringLiteral("scope"), QStringLiteral("images.read"), Right::Read}};
     mRules.tokens = tokens;
     const QByteArray good = "Bearer " + issuer.token(TokenIssuer::claimsWith("exp", 2 * kNow));
-    const QByteArray invalid = R"(Bearer realm="kdd", error="invalid_token", error_description="The token )";
+    const QByteArray invalid = R"(Bearer realm="kdd", error="invalid_token", error_description="The )";
     const struct
     {
         QVector<Http::Field> headers;
@@ -229,7 +229,7 @@ TEST_F(AccessGateTest, TellsWhatIsWrongWithATokenAndNothingOfIt)
         {{}, 401, R"(Bearer realm="kdd")"},
         {{{"authorization", "Basic YTpi"}}, 401, R"(Bearer realm="kdd")"},
         {{{"authorization", "Bearer"}}, 401, R"(Bearer realm="kdd")"},
-        {{{"authorization", "Bearer secret"}}, 401, invalid + "cannot be read\""},
+        {{{"authorization", "Bearer secret"}}, 401, invalid + "token cannot be read\""},
         {{{"authorization", good.chopped(4)}}, 401, invalid},
         {{{"authorization", good}, {"authorization", good}},
          400,
