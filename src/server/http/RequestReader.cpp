@@ -121,7 +121,7 @@ RequestReader::State RequestReader::advance()
         while (d->unread.mid(blank, 2) == "\r\n")
             blank += 2;
         d->unread.remove(0, blank);
-        if (d->unread.isEmpty())
+        if (d->unread.isEmpty() || d->unread == "\r")
             return State::Between;
         d->parser.emplace();
         d->parser->header_limit(mLimits.header);
