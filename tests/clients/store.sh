@@ -33,9 +33,10 @@ server=$!
 read -r said <"$folder/said"
 root=${said##* }/dicom-web
 node "$here/store.mjs" "$root" "$folder/day"
-object=$(find "$folder/store/objects" -name '*.dcm' | head -n 1)
+object=$(find "$folder/store/objects" -name '*.dcm' -print -quit)
 for how in "Transfer-Encoding: chunked" "Expect: 100-continue"; do
-    curl -sS -f -H "Content-Type: application/dicom" -H "$how" --data-binary "@$object" "$root/studies" | grep -q 00081199
+    curl -sS -f -H "Content-Type: application/dicom" -H "$how" --data-binary "@$object" -o "$folder/answer" "$root/studies"
+    grep -q 00081199 "$folder/answer"
 done
 kill "$server"
 wait "$server"

@@ -30,8 +30,8 @@ trap cleanup EXIT
 export KDD_STORE=$folder/store
 "$kdd" --quiet sample "$folder/day" --images 400
 "$kdd" --quiet add "$folder/day" >/dev/null
-study=$("$kdd" list | awk '/ OT / {print $1; exit}')
-image=$("$kdd" --json show "$study" --tree | grep -o '"image": *"[0-9.]*"' | head -n 1 | grep -o '[0-9.]*')
+study=$("$kdd" list | awk '/ OT / && !found {print $1; found = 1}')
+image=$("$kdd" --json show "$study" --tree | sed -n 's/.*"image": *"\([0-9.]*\)".*/\1/p' | sed -n 1p)
 cat >"$folder/job.xml" <<'XML'
 <Job><Timestamp>20240601093000</Timestamp><Login>anna</Login><Substitutions>
 <Tag Group="0010" Element="0010"><Value>&lt;img src=x onerror=window.owned=1&gt;</Value></Tag>

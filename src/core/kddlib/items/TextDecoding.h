@@ -17,7 +17,7 @@ namespace Kdd
 KDD_EXPORT QString decodeText(const QByteArray& bytes, const QByteArray& characterSet);
 
 /// Whether texts of this character set show another character where ASCII has the tilde. In all others ASCII is itself.
-bool replacesTilde(const QByteArray& characterSet);
+KDD_EXPORT bool replacesTilde(const QByteArray& characterSet);
 
 /// Converts a dataset to UTF-8 as a whole, declared character set included. False when that cannot be done: a text
 /// does not fit its character set, or items declare one of their own. The dataset may be half converted then.
