@@ -7,6 +7,8 @@
 #include <kddlib/StudyIndexing.h>
 
 #include <algorithm>
+#include <cmath>
+#include <limits>
 
 namespace Kdd::DicomWeb
 {
@@ -201,8 +203,9 @@ private:
         for (const QString& value : condition.list) {
             bool isNumber = false;
             const double number = value.trimmed().toDouble(&isNumber);
-            // What is no whole number is no series' number.
-            if (isNumber && number == static_cast<int>(number))
+            // What is no whole number of an IS value is no series' number.
+            constexpr double kGreatest = std::numeric_limits<int>::max();
+            if (isNumber && std::abs(number) <= kGreatest && number == static_cast<int>(number))
                 term.values.append(QByteArray::number(static_cast<int>(number)));
         }
         if (term.values.isEmpty())

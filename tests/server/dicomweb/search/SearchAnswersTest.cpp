@@ -181,6 +181,7 @@ const Search kSearches[] = {
     {"00400275.00400009=STEP3", ""},
     {"SOPInstanceUID=2.1.1", "2"},
     {"SeriesNumber=02", "1.1"},
+    {"SeriesNumber=1e30", ""},
     {"BodyPartExamined=HEAD&PatientID=P1", "1.1"},
     {"BodyPartExamined=FOOT&PatientID=P1", ""},
     {"SOPClassesInStudy=1.2.840.10008.5.1.4.1.1.7&StudyInstanceUID=1.1,2", "1.1 2"},
