@@ -260,9 +260,9 @@ const Search kNames[] = {
 
 TEST_P(SearchAnswers, FindPersonsByComponentAndGroup)
 {
-    const char* const persons[] = {"Harris^Tom", "Tom^Harris",
-                                   "Yamada^Tarou=\xe5\xb1\xb1\xe7\x94\xb0^\xe5\xa4\xaa\xe9\x83\x8e="
-                                   "\xe3\x82\x84\xe3\x81\xbe\xe3\x81\xa0^\xe3\x81\x9f"};
+    const char* const yamada = "Yamada^Tarou=\xe5\xb1\xb1\xe7\x94\xb0^\xe5\xa4\xaa\xe9\x83\x8e="
+                               "\xe3\x82\x84\xe3\x81\xbe\xe3\x81\xa0^\xe3\x81\x9f";
+    const char* const persons[] = {"Harris^Tom", "Tom^Harris", yamada};
     for (int i = 0; i < 3; ++i) {
         const QByteArray uid = QByteArray::number(i + 1);
         store(uid.constData(), image((uid + ".1.1").constData(), uid.constData(), (uid + ".1").constData())
