@@ -204,6 +204,9 @@ private:
         }
         for (int count = below(3); count > 0; --count)
             map.putElement(key(), new TagElement(VrCode::LO, text()));
+        // What stands there is of our own making, and not in the image's character set.
+        if (map.findElement(kFilePath) != nullptr)
+            map.putAndInsertString(kFilePath, "/never/shown");
         if (oneIn(4))
             map.markAsOmitted(key());
         if (depth == 0 ? !oneIn(4) : oneIn(mDeclares ? 4 : 40))
