@@ -51,6 +51,10 @@ int statusOf(const boost::beast::error_code& fault)
     return fault == http::error::bad_version ? 505 : 400;
 }
 
+/// What a body in chunks ends with at least, "0", an empty line, and what ends them [bytes]. The parser does not expect to be
+/// asked about fewer once it has seen the zero, and no byte of a body has to be handed on before.
+constexpr int kShortestEnd = 5;
+
 /// "host:80", "[::1]": letters that cannot pass for another part of an address that it is put into.
 bool isHost(const QByteArray& text)
 {
@@ -183,7 +187,8 @@ RequestReader::State RequestReader::letGo()
 RequestReader::Body RequestReader::readBody(char* to, int size, int& count)
 {
     count = 0;
-    while (d->parser && !d->parser->is_done() && !d->unread.isEmpty() && count < size) {
+    const int least = d->parser && d->parser->chunked() ? kShortestEnd : 1;
+    while (d->parser && !d->parser->is_done() && d->unread.size() >= least && count < size) {
         auto& body = d->parser->get().body();
         body.data = to + count;
         body.size = static_cast<std::size_t>(size - count);
