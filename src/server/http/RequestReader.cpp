@@ -131,7 +131,6 @@ RequestReader::State RequestReader::advance()
         d->parser->header_limit(mLimits.header);
         // How much of a body is taken is for whoever takes it.
         d->parser->body_limit(std::numeric_limits<std::uint64_t>::max());
-        d->parser->eager(true);
         d->isUnderstood = false;
         d->gaveLeave = false;
         mLetGo = 0;
@@ -140,8 +139,7 @@ RequestReader::State RequestReader::advance()
         const boost::beast::error_code fault = d->put();
         if (fault == http::error::need_more)
             break;
-        // The body begins, for which there is no place yet.
-        if (fault && fault != http::error::need_buffer)
+        if (fault)
             return refuse(statusOf(fault));
     }
     if (!d->parser->is_header_done())
@@ -151,6 +149,8 @@ RequestReader::State RequestReader::advance()
         if (understood == State::Refused)
             return understood;
         d->isUnderstood = true;
+        // Not before: fields behind a body would pass for those of the header, which others may have looked at on the way.
+        d->parser->eager(true);
         if (mRequest.method == Method::Post)
             return State::Headed;
     }
@@ -218,6 +218,7 @@ RequestReader::State RequestReader::understand()
     mKeepsConnection = message.keep_alive();
     mIsOldVersion = message.version() < 11;
     int hosts = 0;
+    bool isFramed = true;
     mHost.clear();
     for (const auto& field : message) {
         mRequest.headers.append({bytesOf(field.name_string()).toLower(), bytesOf(field.value())});
@@ -225,10 +226,14 @@ RequestReader::State RequestReader::understand()
             mHost = bytesOf(field.value());
             ++hosts;
         }
+        if (field.name() == http::field::transfer_encoding)
+            isFramed = isFramed && !mIsOldVersion && boost::beast::iequals(field.value(), "chunked");
     }
     RequestTarget target;
-    // Of two hosts whoever stands in front of us may have looked at the other one.
-    if (hosts > 1 || (hosts == 0 && !mIsOldVersion) || !RequestTarget::parse(mRequest.target, target))
+    // Of two hosts whoever stands in front of us may have looked at the other one, and what it does not take for chunks is
+    // the next request to it.
+    if (!isFramed || hosts > 1 || (hosts == 0 && !mIsOldVersion) ||
+        !RequestTarget::parse(mRequest.target, target))
         return refuse(400);
     if (!target.authority.isNull())
         mHost = target.authority;

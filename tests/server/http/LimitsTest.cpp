@@ -40,6 +40,8 @@ TEST(HttpLimits, AreToldToWhoeverGoesBeyondThem)
         {"GET http://a@localhost/ HTTP/1.1\r\nHost: localhost\r\n\r\n", 400},
         {"GET /a/%2e%2e/b HTTP/1.1\r\nHost: localhost\r\n\r\n", 400},
         {start + "Content-Length: 1\r\nTransfer-Encoding: chunked\r\n\r\n", 400},
+        {start + "Transfer-Encoding: chunked[\r\n\r\n0\r\n\r\n", 400},
+        {start + "Transfer-Encoding: gzip, chunked\r\n\r\n0\r\n\r\n", 400},
         {start + "Content-Length: -1\r\n\r\n", 400},
         {start + "a b: c\r\n\r\n", 400},
         {start + "a: " + QByteArray(40'000, 'x') + "\r\n\r\n", 431},

@@ -111,6 +111,10 @@ TEST_F(RequestBody, IsTakenHoweverItIsSent)
     const Reply empty = client.reply();
     EXPECT_EQ(empty.status, 200) << "one that came with the former";
     EXPECT_EQ(empty.body, "");
+    client.send(post("/keep", "Transfer-Encoding: chunked\r\n") + "0\r\nX-Request-Id: behind\r\n\r\n");
+    const Reply trailed = client.reply();
+    EXPECT_EQ(trailed.status, 200);
+    EXPECT_NE(trailed.header("X-Request-Id"), "behind") << "no field of the header";
 }
 
 TEST_F(RequestBody, WaitsForLeaveAndGetsItOnlyWhereItIsWanted)
