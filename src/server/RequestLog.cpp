@@ -20,24 +20,6 @@ constexpr const char* kGroups[] = {"bulkdata",  "changefeed", "frames",   "insta
                                    "patients",  "pixeldata",  "rendered", "series",    "studies",
                                    "thumbnail", "volumes",    "wado"};
 
-const char* methodText(Http::Method method)
-{
-    switch (method) {
-    case Http::Method::Get:
-        return "GET";
-    case Http::Method::Head:
-        return "HEAD";
-    case Http::Method::Options:
-        return "OPTIONS";
-    case Http::Method::Post:
-        return "POST";
-    case Http::Method::Delete:
-        return "DELETE";
-    default:
-        return "other";
-    }
-}
-
 /// With the names of the parameters, but not what they are set to.
 QByteArray withoutValues(const QByteArray& target)
 {
@@ -76,7 +58,7 @@ void RequestLog::ended(const Http::Exchange& exchange)
     if (!isFailed && exchange.duration < mSlow)
         return;
     const auto ms = std::chrono::duration_cast<std::chrono::milliseconds>(exchange.duration).count();
-    const QByteArray line = exchange.request.id + ": " + methodText(exchange.request.method) + ' ' +
+    const QByteArray line = exchange.request.id + ": " + nameOf(exchange.request.method) + ' ' +
                             withoutValues(exchange.request.target) + ' ' +
                             QByteArray::number(exchange.status) + ", " + QByteArray::number(exchange.bytes) +
                             " bytes, " + QByteArray::number(static_cast<qlonglong>(ms)) + " ms";

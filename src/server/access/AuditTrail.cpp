@@ -24,24 +24,6 @@ namespace
 /// For the group that keeps trails, and nobody else: they tell who looked at whom.
 constexpr int kMode = 0640;
 
-const char* nameOf(Http::Method method)
-{
-    switch (method) {
-    case Http::Method::Get:
-        return "GET";
-    case Http::Method::Head:
-        return "HEAD";
-    case Http::Method::Options:
-        return "OPTIONS";
-    case Http::Method::Post:
-        return "POST";
-    case Http::Method::Delete:
-        return "DELETE";
-    default:
-        return "other";
-    }
-}
-
 /// The nearest of those that a proxy speaks for; null when it does not say.
 QByteArray clientOf(const Http::Request& request)
 {

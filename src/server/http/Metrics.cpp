@@ -11,24 +11,6 @@ namespace
 constexpr std::array<double, 12> kBounds = {0.001, 0.0025, 0.005, 0.01, 0.025, 0.05,
                                             0.1,   0.25,   0.5,   1,    2.5,   10};
 
-const char* nameOf(Method method)
-{
-    switch (method) {
-    case Method::Get:
-        return "GET";
-    case Method::Head:
-        return "HEAD";
-    case Method::Options:
-        return "OPTIONS";
-    case Method::Post:
-        return "POST";
-    case Method::Delete:
-        return "DELETE";
-    default:
-        return "other";
-    }
-}
-
 QByteArray heading(const QByteArray& name, const QByteArray& help, const char* type)
 {
     return "# HELP " + name + ' ' + help + "\n# TYPE " + name + ' ' + type + '\n';
@@ -40,14 +22,6 @@ QByteArray line(const QByteArray& name, const QByteArray& label, const QByteArra
 }
 
 }  // namespace
-
-std::atomic<qint64>& Metrics::counter(const QByteArray& name, const QByteArray& help, const QByteArray& label)
-{
-    const std::lock_guard<std::mutex> lock(mMutex);
-    Family& family = mCounters[name];
-    family.help = help;
-    return family.values[label];
-}
 
 void Metrics::addGauge(const QByteArray& name, const QByteArray& help, std::function<qint64()> value)
 {
@@ -128,11 +102,6 @@ QByteArray Metrics::text() const
     for (const Gauge& gauge : mGauges)
         text += heading(gauge.name, gauge.help, "gauge") +
                 line(gauge.name, {}, QByteArray::number(gauge.value()));
-    for (const auto& [name, family] : mCounters) {
-        text += heading(name, family.help, "counter");
-        for (const auto& [label, value] : family.values)
-            text += line(name, label, QByteArray::number(value.load()));
-    }
     return text;
 }
 

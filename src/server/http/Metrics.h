@@ -17,11 +17,6 @@ namespace Kdd::Http
 class Metrics
 {
 public:
-    /// A number that only grows, and lives as long as this. Whoever asks for the same name and label gets the same one.
-    /// `name` is what Prometheus takes ("kdd_cache_hits_total"), `label` empty or "cache=\"metadata\"", and `help` one line.
-    std::atomic<qint64>& counter(const QByteArray& name, const QByteArray& help,
-                                 const QByteArray& label = {});
-
     /// A number that is asked for when it is needed, on any thread, as long as this lives.
     void addGauge(const QByteArray& name, const QByteArray& help, std::function<qint64()> value);
 
@@ -44,12 +39,6 @@ private:
         double seconds = 0;
     };
 
-    struct Family
-    {
-        QByteArray help;
-        std::map<QByteArray, std::atomic<qint64>> values;  // by label
-    };
-
     struct Gauge
     {
         QByteArray name;
@@ -62,7 +51,6 @@ private:
     QByteArray latencyText() const;
 
     mutable std::mutex mMutex;
-    std::map<QByteArray, Family> mCounters;  // by name
     std::vector<Gauge> mGauges;
     std::map<QByteArray, const CacheCount*> mCaches;                  // by name
     std::map<std::tuple<QByteArray, Method, int>, qint64> mRequests;  // by group, method, status

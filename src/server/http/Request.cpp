@@ -3,6 +3,24 @@
 namespace Kdd::Http
 {
 
+const char* nameOf(Method method)
+{
+    switch (method) {
+    case Method::Get:
+        return "GET";
+    case Method::Head:
+        return "HEAD";
+    case Method::Options:
+        return "OPTIONS";
+    case Method::Post:
+        return "POST";
+    case Method::Delete:
+        return "DELETE";
+    default:
+        return "other";
+    }
+}
+
 QByteArray Request::header(const char* name) const
 {
     QByteArray joined;

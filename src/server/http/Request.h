@@ -8,6 +8,9 @@ namespace Kdd::Http
 
 enum class Method { Get, Head, Options, Post, Delete, Other };
 
+/// As it is sent; "other" for one that nothing here takes.
+const char* nameOf(Method method);
+
 struct Field
 {
     QByteArray name;

@@ -2,8 +2,7 @@
 
 #include "server/dicomweb/metadata/MetadataAnswer.h"
 #include "server/dicomweb/metadata/MetadataText.h"
-
-#include <QList>
+#include "server/http/EntityTag.h"
 
 namespace Kdd::DicomWeb
 {
@@ -22,25 +21,15 @@ QByteArray entityTag(const MetadataRequest& metadata, const QByteArray& version)
     return '"' + nameOf(metadata, version) + (metadata.takesGzip ? "-gzip\"" : "\"");
 }
 
-/// Whether the client has what the tag stands for. `any`: "*" counts, which says no more than that there is something.
-bool hasEntity(const Http::Request& request, const QByteArray& tag, bool any)
-{
-    const QList<QByteArray> tags = request.header("if-none-match").split(',');
-    for (const QByteArray& each : tags) {
-        const QByteArray held = each.trimmed();
-        if (held == tag || held == "W/" + tag || (any && held == "*"))
-            return true;
-    }
-    return false;
-}
+const QByteArray kVary = "Accept, Accept-Encoding";
 
-Http::Response withTag(int status, const QByteArray& tag)
+Http::Response found(const QByteArray& tag, const MetadataRequest& metadata)
 {
-    Http::Response response(status);
-    response.addHeader("ETag", tag);
-    response.addHeader("Vary", "Accept, Accept-Encoding");
-    // To be asked for again each time, which costs little: corrections count at once.
-    response.addHeader("Cache-Control", "private, no-cache");
+    Http::Response response;
+    Http::addEntityTag(tag, response, kVary);
+    response.addHeader("Content-Type", metadata.contentType());
+    if (metadata.takesGzip)
+        response.addHeader("Content-Encoding", "gzip");
     return response;
 }
 
@@ -84,13 +73,11 @@ Http::Response MetadataResource::answer(const Http::Request& request, const Reso
     if (presence != Presence::Found)
         return notThere(presence);
     const QByteArray tag = entityTag(metadata, version);
-    if (hasEntity(request, tag, false))
-        return withTag(304, tag);
+    if (Http::hasEntity(request, tag, Http::AnyTag::DoesNotCount))
+        return Http::notModified(tag, kVary);
     Http::FileRange kept;
     if (metadata.takesGzip && path.instance.isEmpty() && mKept.find(nameOf(metadata, version), kept)) {
-        Http::Response response = withTag(200, tag);
-        response.addHeader("Content-Type", metadata.contentType());
-        response.addHeader("Content-Encoding", "gzip");
+        Http::Response response = found(tag, metadata);
         response.body.emplace_back(std::move(kept));
         return response;
     }
@@ -109,12 +96,9 @@ Http::Response MetadataResource::answerFrom(std::shared_ptr<const ServedStudy> s
     if (text->count() == 0)
         return Http::failure(404, metadata.path.instance.isEmpty() ? QStringLiteral("No such series")
                                                                    : QStringLiteral("No such instance"));
-    if (hasEntity(request, tag, true))
-        return withTag(304, tag);
-    Http::Response response = withTag(200, tag);
-    response.addHeader("Content-Type", metadata.contentType());
-    if (metadata.takesGzip)
-        response.addHeader("Content-Encoding", "gzip");
+    if (Http::hasEntity(request, tag))
+        return Http::notModified(tag, kVary);
+    Http::Response response = found(tag, metadata);
     addBody(response, std::move(text), metadata.takesGzip, mKept, nameOf(metadata, version));
     return response;
 }
