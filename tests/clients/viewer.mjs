@@ -3,15 +3,11 @@
 //
 // usage: node viewer.mjs http://localhost:PORT FOLDER [KIND...]      FOLDER receives screenshots
 
-import { createRequire } from 'node:module';
 import { check, report, root, value } from './archive.mjs';
+import { kPatience, launch, newPage as newViewerPage, timing } from './pictures.mjs';
 
-const require = createRequire(process.env.KDD_NODE_MODULES + '/');
-const puppeteer = require('puppeteer-core');
 const [folder, ...chosen] = process.argv.slice(3);
 
-// More than the slowest machine needs; nothing waits for it to pass.
-const kPatience = 180000;
 const kUrl = 'viewer?StudyInstanceUIDs=';
 
 // What is asked for, and what has to be seen of it. `series` is opened by two clicks, for kinds that are not what comes first.
@@ -37,33 +33,6 @@ const searches = [
   ['startDate=20260301&endDate=20260301', 'Viewer,'],
 ];
 
-/// In the page: notes when the first viewport shows something, by its own clock [ms].
-function watchPictures() {
-  localStorage.setItem('shownTours', '["basicViewerTour"]');
-  const small = document.createElement('canvas');
-  small.width = small.height = 64;
-  const context = small.getContext('2d', { willReadFrequently: true });
-  /// Of each viewport how far its grey values reach, and how many of its pixels have a colour.
-  window.looks = () => [...document.querySelectorAll('.cornerstone-canvas, .viewport-element canvas')].map((canvas) => {
-    context.clearRect(0, 0, 64, 64);
-    context.drawImage(canvas, 0, 0, 64, 64);
-    const { data } = context.getImageData(0, 0, 64, 64);
-    const look = { least: 255, most: 0, colours: 0 };
-    for (let i = 0; i < data.length; i += 4) {
-      const [red, green, blue] = data.slice(i, i + 3);
-      look.least = Math.min(look.least, green);
-      look.most = Math.max(look.most, green);
-      if (Math.max(red, green, blue) - Math.min(red, green, blue) > 30) ++look.colours;
-    }
-    return look;
-  });
-  const timer = setInterval(() => {
-    if (!window.looks().some(({ least, most }) => most - least > 40)) return;
-    window.firstPicture = performance.now();
-    clearInterval(timer);
-  }, 25);
-}
-
 /// In the page, whether it shows what is to be seen.
 const sights = {
   picture: (viewports) => window.looks().filter(({ least, most }) => most - least > 40).length >= viewports,
@@ -72,39 +41,19 @@ const sights = {
   text: () => /Findings|Measurement|Report|Content/i.test(document.querySelector('[data-cy="viewport-pane"], [data-viewportid]')?.innerText ?? ''),
 };
 
-const browser = await puppeteer.launch({
-  executablePath: process.env.CHROMIUM ?? '/usr/bin/chromium',
-  // Nothing but this machine can be reached, at a place of care too.
-  args: ['--no-sandbox', '--host-resolver-rules=MAP * ~NOTFOUND, EXCLUDE localhost, EXCLUDE 127.0.0.1', '--use-gl=angle', '--use-angle=swiftshader', '--enable-unsafe-swiftshader'],
-  protocolTimeout: 2 * kPatience,
-});
+const browser = await launch();
 
 /// A new page whose faults are told under the name.
 async function newPage(name) {
-  const page = await browser.newPage();
-  await page.setViewport({ width: 1400, height: 900 });
-  page.setDefaultTimeout(kPatience);
+  const page = await newViewerPage(browser);
   page.on('response', (answer) => check(answer.status() < 400, `${name}: ${answer.status()} ${answer.url()}`));
   page.on('requestfailed', (request) => check(request.failure()?.errorText === 'net::ERR_ABORTED',
     `${name}: ${request.failure()?.errorText} ${request.url().slice(0, 200)}`));
   page.on('pageerror', (error) => check(false, `${name}: ${error}`));
   page.on('console', (message) => check(message.type() !== 'error', `${name}: ${message.text().slice(0, 300)}`));
   page.on('dialog', (dialog) => check(false, `${name}: ${dialog.message()}`) ?? dialog.dismiss());
-  await page.evaluateOnNewDocument(watchPictures);
   return page;
 }
-
-/// How long the first picture took, and how much of that the requests of data from the first to its frame.
-const timing = () => {
-  const asked = performance.getEntriesByType('resource').filter((one) => one.name.includes('/dicom-web/'));
-  const frame = asked.find((one) => one.name.includes('/frames/'));
-  if (!window.firstPicture || !frame) return '';
-  const busy = asked.filter((one) => one.startTime <= frame.startTime && /metadata|series|studies\?|frames/.test(one.name));
-  const longest = busy.reduce((most, one) => (one.duration > most.duration ? one : most));
-  const round = Math.round;
-  return `first picture ${round(window.firstPicture)} ms; first request at ${round(asked[0].startTime)}, first frame asked for at `
-    + `${round(frame.startTime)}, there at ${round(frame.responseEnd)}; longest answer ${round(longest.duration)} ms`;
-};
 
 async function openKind({ name, query, mode = '', series, sees, viewports = 1 }) {
   const answer = await fetch(`${root}/dicom-web/studies?${query}&limit=1`);
@@ -123,7 +72,7 @@ async function openKind({ name, query, mode = '', series, sees, viewports = 1 })
   const told = await page.evaluate(() => document.body.innerText.match(/[^\n]*(not available|went wrong|failed|error)[^\n]*/i)?.[0]);
   check(!told, `${name}: "${told}" is shown`);
   await page.screenshot({ path: `${folder}/${name}.png` });
-  console.log(name.padEnd(6), await page.evaluate(timing));
+  console.log(name.padEnd(6), JSON.stringify(await page.evaluate(timing)));
   await page.close();
 }
 
