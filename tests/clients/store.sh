@@ -9,38 +9,21 @@ set -euo pipefail
 kdd=$1
 export KDD_NODE_MODULES=$2
 here=$(cd "$(dirname "$0")" && pwd)
-if ! command -v node >/dev/null || ! command -v curl >/dev/null || [ ! -d "$KDD_NODE_MODULES/dicomweb-client" ]; then
-    echo "Skipped: there is no node with dicomweb-client, or no curl"
-    exit 77
-fi
+. "$here/serving.sh"
+need node curl "$KDD_NODE_MODULES/dicomweb-client"
 
-folder=$(mktemp -d)
-server=
-cleanup() {
-    [ -z "$server" ] || kill "$server" 2>/dev/null || true
-    [ -z "$server" ] || wait "$server" 2>/dev/null || true
-    rm -rf "$folder"
-}
-trap cleanup EXIT
-
-export KDD_STORE=$folder/store KDD_FREE_SPACE=0
+export KDD_FREE_SPACE=0
 "$kdd" --quiet sample "$folder/day" --images 60
 # Volume files are made by the archive and are not sent.
 find "$folder/day" -type f -name '*.vol*' -delete
-mkfifo "$folder/said"
-"$kdd" serve --stow --listen 127.0.0.1:0 >"$folder/said" &
-server=$!
-read -r said <"$folder/said"
-root=${said##* }/dicom-web
-node "$here/store.mjs" "$root" "$folder/day"
+serve --stow
+node "$here/store.mjs" "$root/dicom-web" "$folder/day"
 object=$(find "$folder/store/objects" -name '*.dcm' -print -quit)
 for how in "Transfer-Encoding: chunked" "Expect: 100-continue"; do
-    curl -sS -f -H "Content-Type: application/dicom" -H "$how" --data-binary "@$object" -o "$folder/answer" "$root/studies"
+    curl -sS -f -H "Content-Type: application/dicom" -H "$how" --data-binary "@$object" -o "$folder/answer" "$root/dicom-web/studies"
     grep -q 00081199 "$folder/answer"
 done
-kill "$server"
-wait "$server"
-server=
+stop
 
 "$kdd" --quiet build --all --settle >/dev/null
 "$kdd" verify --all

@@ -13,32 +13,13 @@ pictures=${4:-pictures}
 images=${5:-24}
 here=$(cd "$(dirname "$0")" && pwd)
 
-skip() {
-    echo "Skipped: $1"
-    exit 77
-}
-command -v node >/dev/null || skip "there is no node"
-[ -x "${CHROMIUM:-/usr/bin/chromium}" ] || skip "there is no Chromium"
-[ -d "$KDD_NODE_MODULES/puppeteer-core" ] || skip "$KDD_NODE_MODULES has no puppeteer-core"
-[ -e "$viewer/index.html" ] || skip "$viewer holds no viewer; ./dev viewer gets one"
+. "$here/serving.sh"
+need node "${CHROMIUM:-/usr/bin/chromium}" "$KDD_NODE_MODULES/puppeteer-core" "$viewer/index.html"
 
-folder=$(mktemp -d)
-server=
-cleanup() {
-    [ -z "$server" ] || kill "$server" 2>/dev/null || true
-    [ -z "$server" ] || wait "$server" 2>/dev/null || true
-    rm -rf "$folder"
-}
-trap cleanup EXIT
-
-export KDD_STORE=$folder/store
 "$kdd" --quiet sample "$folder/day" --images 400
 node "$here/objects.mjs" "$folder/objects" "$images"
 "$kdd" --quiet add "$folder/day" "$folder/objects" >/dev/null
-mkfifo "$folder/said"
-"$kdd" serve --listen 127.0.0.1:0 --viewer "$viewer" >"$folder/said" &
-server=$!
-read -r said <"$folder/said"
+serve --viewer "$viewer"
 mkdir -p "$pictures"
 # The viewer's programs take "localhost" for a secure place.
-node "$here/viewer.mjs" "http://localhost:${said##*:}" "$pictures" "${@:6}"
+node "$here/viewer.mjs" "http://localhost:${root##*:}" "$pictures" "${@:6}"

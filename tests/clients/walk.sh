@@ -8,25 +8,10 @@ set -euo pipefail
 kdd=$1
 export KDD_NODE_MODULES=$2
 here=$(cd "$(dirname "$0")" && pwd)
-if ! command -v node >/dev/null || [ ! -d "$KDD_NODE_MODULES/dicomweb-client" ]; then
-    echo "Skipped: there is no node with dicomweb-client"
-    exit 77
-fi
+. "$here/serving.sh"
+need node "$KDD_NODE_MODULES/dicomweb-client"
 
-folder=$(mktemp -d)
-server=
-cleanup() {
-    [ -z "$server" ] || kill "$server" 2>/dev/null || true
-    [ -z "$server" ] || wait "$server" 2>/dev/null || true
-    rm -rf "$folder"
-}
-trap cleanup EXIT
-
-export KDD_STORE=$folder/store
 "$kdd" --quiet sample "$folder/day" --images 200
 "$kdd" --quiet add "$folder/day" >/dev/null
-mkfifo "$folder/said"
-"$kdd" serve --listen 127.0.0.1:0 >"$folder/said" &
-server=$!
-read -r said <"$folder/said"
-node "$here/walk.mjs" "${said##* }/dicom-web"
+serve
+node "$here/walk.mjs" "$root/dicom-web"

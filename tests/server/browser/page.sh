@@ -10,24 +10,9 @@ kdd=$1
 pictures=${2:-}
 here=$(cd "$(dirname "$0")" && pwd)
 
-skip() {
-    echo "Skipped: $1"
-    exit 77
-}
-command -v node >/dev/null || skip "there is no node"
-[ -x "${CHROMIUM:-/usr/bin/chromium}" ] || skip "there is no Chromium"
-[ -d "${KDD_NODE_MODULES:-}/puppeteer-core" ] || skip "KDD_NODE_MODULES names no folder with puppeteer-core"
+. "$here/../../clients/serving.sh"
+need node "${CHROMIUM:-/usr/bin/chromium}" "${KDD_NODE_MODULES:-}/puppeteer-core"
 
-folder=$(mktemp -d)
-server=
-cleanup() {
-    [ -z "$server" ] || kill "$server" 2>/dev/null || true
-    [ -z "$server" ] || wait "$server" 2>/dev/null || true
-    rm -rf "$folder"
-}
-trap cleanup EXIT
-
-export KDD_STORE=$folder/store
 "$kdd" --quiet sample "$folder/day" --images 400
 "$kdd" --quiet add "$folder/day" >/dev/null
 study=$("$kdd" list | awk '/ OT / && !found {print $1; found = 1}')
@@ -40,8 +25,5 @@ cat >"$folder/job.xml" <<'XML'
 XML
 "$kdd" --quiet qa "$folder/job.xml" --study "$study" --image "$image"
 
-mkfifo "$folder/said"
-"$kdd" serve --listen 127.0.0.1:0 >"$folder/said" &
-server=$!
-read -r said <"$folder/said"
-node "$here/page.mjs" "${said##* }" "$pictures"
+serve
+node "$here/page.mjs" "$root" "$pictures"
