@@ -4,6 +4,7 @@ set(KDD_PUBLIC_HEADERS
   core/kddlib/Loader.h
   core/kddlib/TagFileGenerator.h
   core/kddlib/archive/ArchiveDatabase.h
+  core/kddlib/archive/ArchiveRestoration.h
   core/kddlib/archive/ArrivedStudies.h
   core/kddlib/archive/CorrectedDataset.h
   core/kddlib/archive/DicomInput.h
@@ -18,6 +19,7 @@ set(KDD_PUBLIC_HEADERS
   core/kddlib/archive/StudyIndexing.h
   core/kddlib/archive/StudyIntake.h
   core/kddlib/archive/StudyStacker.h
+  core/kddlib/archive/StudyWorkers.h
   core/kddlib/archive/WorkObserver.h
   core/kddlib/capi/kddstream.h
   core/kddlib/capi/kddtagfile.h

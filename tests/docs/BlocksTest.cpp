@@ -1,6 +1,7 @@
 #include "Pages.h"
 #include "SampleArchive.h"
 #include "kddlib/tagfile/qa/QAData.h"
+#include "support/PostgresServer.h"
 
 #include <QSettings>
 
@@ -18,7 +19,7 @@ TEST_F(Blocks, AllSayInWhichLanguageTheyAreAndAreTested)
 {
     // "text" is for layouts and diagrams, which nothing can run.
     const QStringList languages =
-        QStringLiteral("c cmake console cpp ini json nginx python sh text xml").split(QLatin1Char(' '));
+        QStringLiteral("c cmake console cpp ini json nginx python sh sql text xml").split(QLatin1Char(' '));
     for (const Block& block : allBlocks())
         EXPECT_TRUE(languages.contains(block.language))
             << block.place() << " is in \"" << block.language.toStdString()
@@ -67,12 +68,39 @@ TEST_F(Blocks, ForTheShellAndCMakeAreWellFormed)
         putBeside("block.cmake", "if(FALSE)\n" + block.text.toUtf8() + "endif()\n");
         EXPECT_EQ(shell({QStringLiteral("cmake -P block.cmake")}).exitCode, 0) << block.place();
     }
+}
+
+TEST_F(Blocks, ForNginxAreConfigurations)
+{
+    EXPECT_EQ(shell({QStringLiteral("openssl req -x509 -newkey rsa:2048 -nodes -subj /CN=localhost -keyout key.pem "
+                                    "-out tls.pem 2>/dev/null")})
+                  .exitCode,
+              0);
     for (const Block& block : blocksIn("nginx")) {
+        QByteArray text = block.text.toUtf8().replace("/etc/kdd/", "").replace("listen 443", "listen 127.0.0.1:0");
+        // Some are whole servers, some stand in one.
+        if (!text.contains("\nserver {"))
+            text = "server {\n" + text + "}\n";
         putBeside("block.conf",
-                  "pid block.pid;\nerror_log stderr;\nevents {}\nhttp {\naccess_log off;\nserver {\n" +
-                      block.text.toUtf8() + "}\n}\n");
+                  "pid block.pid;\nerror_log stderr;\nevents {}\nhttp {\naccess_log off;\n" + text + "}\n");
         const Answer answer = shell({QStringLiteral("/usr/sbin/nginx -t -p . -c block.conf")});
         EXPECT_EQ(answer.exitCode, 0) << block.place() << answer.err.toStdString();
+    }
+}
+
+TEST_F(Blocks, InSqlAskAnImageDatabase)
+{
+    const QString address = QString::fromUtf8(newPostgresDatabase());
+    EXPECT_EQ(shell({QStringLiteral("kdd --quiet sample day --images 60"),
+                     QStringLiteral("KDD_DATABASE='%1' kdd --quiet index day").arg(address)})
+                  .exitCode,
+              0);
+    for (const Block& block : blocksIn("sql")) {
+        putBeside("block.sql", block.text.toUtf8());
+        const Answer answer =
+            shell({QStringLiteral("psql -v ON_ERROR_STOP=1 -f block.sql '%1'").arg(address)});
+        EXPECT_EQ(answer.exitCode, 0) << block.place() << answer.err.toStdString();
+        EXPECT_FALSE(answer.out.contains("(0 rows)")) << block.place();
     }
 }
 

@@ -63,6 +63,7 @@ QString SampleArchive::substituted(QString text) const
         {"https://host/", QString::fromStdString(mServer.url(""))},
         {"gs://bucket/a.dcm", QString::fromStdString(mServer.url("a.dcm"))},
         {"/etc/kdd/service-account.json", path("account.json")},
+        {"postgresql:///kdd?host=/var/run/postgresql", QStringLiteral("sqlite:/var/lib/kdd/kdd.sqlite")},
         {"/var/lib/kdd", path("store")},
     };
     for (const auto& [there, here] : kStandIns)

@@ -44,11 +44,16 @@ for name in libkdd0 libkdd-dev kdd libkdd-video; do
 done
 dpkg-deb -I "$(package libkdd0)" triggers | grep -qx 'activate-noawait ldconfig' || fail "libkdd0 does not tell ldconfig"
 
-unit=$root/usr/lib/systemd/system/kdd-serve.service
-grep -qx 'ExecStart=/usr/bin/kdd --flush serve' "$unit" || fail "The service does not start the tool"
-if [ -d /run/systemd/system ]; then
-    systemd-analyze verify --root="$root" kdd-serve.service || fail "The service is not well formed"
-fi
+# starts UNIT COMMAND
+starts() {
+    grep -qx "ExecStart=/usr/bin/kdd $2" "$root/usr/lib/systemd/system/$1" || fail "$1 does not start the tool"
+    if [ -d /run/systemd/system ]; then
+        systemd-analyze verify --root="$root" "${1/@/@8042}" || fail "$1 is not well formed"
+    fi
+}
+starts kdd-serve.service '--flush serve'
+starts kdd-serve@.service '--flush serve --listen 127.0.0.1:%i --status 127.0.0.1:1%i'
+starts kdd-build.service '--flush --quiet build --forever'
 [ -s "$root/usr/share/doc/kdd/examples/kdd.ini" ] && [ -s "$root/usr/lib/sysusers.d/kdd.conf" ] ||
     fail "The service has no user or no settings to begin with"
 

@@ -1,5 +1,4 @@
-#include "CommandLineFixture.h"
-#include "server/http/Client.h"
+#include "ServedStore.h"
 
 #include <QDirIterator>
 
@@ -13,7 +12,7 @@ namespace
 {
 
 /// Servers that take objects while they are killed.
-class Store : public CommandLine
+class Store : public ServedStore
 {
 protected:
     static QByteArray uidOf(int number) { return "1.2.3." + QByteArray::number(number); }
@@ -28,34 +27,12 @@ protected:
         return bytes(name.constData());
     }
 
-    std::unique_ptr<QProcess> serve(quint16& port) const
-    {
-        auto process = start("--json serve --stow --listen 127.0.0.1:0");
-        EXPECT_TRUE(process->waitForReadyRead(kTimeout)) << process->readAllStandardError().toStdString();
-        const QString address =
-            QJsonDocument::fromJson(process->readLine()).object().value(QLatin1String("address")).toString();
-        port = address.mid(address.lastIndexOf(QLatin1Char(':')) + 1).toUShort();
-        return process;
-    }
-
     /// Of the one study.
     QByteArray tagFile() const
     {
         QDirIterator files(path("store/meta"), {QStringLiteral("*.tc")}, QDir::Files,
                            QDirIterator::Subdirectories);
         return files.hasNext() ? fileContent(files.next()) : QByteArray("(no tag file)");
-    }
-
-    /// The status; 0 when the server went before it told one.
-    static int send(quint16 port, const QByteArray& object)
-    {
-        Client client("http://127.0.0.1:" + QByteArray::number(port));
-        if (!client.isConnected())
-            return 0;
-        client.send("POST /dicom-web/studies HTTP/1.1\r\nHost: localhost\r\nConnection: close\r\n"
-                    "Content-Type: application/dicom\r\nContent-Length: " +
-                    QByteArray::number(object.size()) + "\r\n\r\n" + object);
-        return client.reply().status;
     }
 };
 

@@ -355,6 +355,19 @@ public:
     virtual Kdd::Result imageFiles(const QByteArray& studyUID, const QByteArray& sopUID,
                                    QVector<KeptFile>& files) = 0;
 
+    // ---- several at work
+
+    /// As `claimNext`, but leaves a study alone of which it is only known that new files came within the last `restMs`
+    /// [ms]: whoever took them in has them at hand, and completes the study himself if he lives.
+    virtual Kdd::Result claimRested(const QSet<int>& except, int restMs,
+                                    std::unique_ptr<StudyClaim>& claim) = 0;
+
+    /// The requests of a study that were left because files came that were not known before, and for nothing else.
+    virtual Kdd::Result additions(const QByteArray& studyUID, QVector<qint64>& requests) = 0;
+
+    /// The files at or below a path that were removed and not registered again.
+    virtual Kdd::Result forgottenFiles(const QByteArray& path, QSet<QByteArray>& paths) = 0;
+
 protected:
     Catalogue() = default;
 };

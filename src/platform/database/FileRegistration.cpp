@@ -73,6 +73,7 @@ void FileRegistration::run(const FileRecords& files, RegistrationOutcome& outcom
 {
     mOutcome = &outcome;
     std::vector<Entry> entries = inOrder(files);
+    mHasForgotten = mConnection.ask("SELECT 1 FROM forgotten_file LIMIT 1").next();
     // Without any, no file has to be looked up.
     if (hasCorrections(mConnection))
         followCorrections(entries);
@@ -93,7 +94,8 @@ void FileRegistration::run(const FileRecords& files, RegistrationOutcome& outcom
     QList<qint64> touched = mTouched.values();
     std::sort(touched.begin(), touched.end());
     for (const qint64 studyId : qAsConst(touched))
-        concludeChange(mConnection, studyId, outcome.requests);
+        concludeChange(mConnection, studyId, outcome.requests,
+                       mChanged.contains(studyId) ? Reason::Changed : Reason::Added);
 }
 
 /// A file of an image that was corrected belongs where the correction put the image.
@@ -144,6 +146,8 @@ void FileRegistration::put(std::vector<Entry> entries)
 
 void FileRegistration::write(const std::vector<Entry>& entries)
 {
+    if (mHasForgotten)
+        remember(entries);
     QVariantList values;
     for (const Entry& entry : entries)
         values << bytesValue(entry.path) << entry.stamp.size << entry.stamp.modified
@@ -162,6 +166,15 @@ void FileRegistration::write(const std::vector<Entry>& entries)
         values);
 }
 
+void FileRegistration::remember(const std::vector<Entry>& entries)
+{
+    QVariantList paths;
+    for (const Entry& entry : entries)
+        paths << bytesValue(entry.path);
+    mConnection.change("DELETE FROM forgotten_file WHERE path IN (" + repeated("?", paths.size()) + ")",
+                       paths);
+}
+
 /// The images that are known under the paths so far.
 QHash<QByteArray, FileRegistration::Image> FileRegistration::formerImages(const std::vector<Entry>& entries)
 {
@@ -176,6 +189,7 @@ QHash<QByteArray, FileRegistration::Image> FileRegistration::formerImages(const 
     while (rows.next()) {
         // The study that a file leaves changes too.
         mTouched.insert(rows.number(1));
+        mChanged.insert(rows.number(1));
         if (rows.number(3) == static_cast<int>(FileKind::Dicom) && !rows.text(2).isEmpty())
             former.insert(rows.bytes(0), {rows.number(1), rows.text(2)});
     }

@@ -40,14 +40,17 @@ private:
     void settleConflicts(std::vector<Entry>& entries);
     void tellConflict(const Entry& entry, const Entry& other);
     void write(const std::vector<Entry>& entries);
+    void remember(const std::vector<Entry>& entries);
 
     SqlConnection& mConnection;
     RegistrationOutcome* mOutcome = nullptr;
+    bool mHasForgotten = false;            // any file at all
     qint64 mNumber = 0;                    // of the next file
     QHash<QByteArray, KeptNode> mStudies;  // that were met in this transaction
     QHash<QPair<qint64, QByteArray>, KeptNode> mSeries;
     QSet<qint64> mTouched;
-    QSet<Image> mLeft;  // images whose shown file may be another one now
+    QSet<qint64> mChanged;  // of these the ones of which something was known before
+    QSet<Image> mLeft;      // images whose shown file may be another one now
 };
 
 }  // namespace Kxg

@@ -149,6 +149,15 @@ const QStringList kSteps[] = {
                        " study_uid {text} NOT NULL, from_uid {text} NOT NULL, to_uid {text} NOT NULL,"
                        " instance_count BIGINT NOT NULL, at BIGINT NOT NULL)"),
     },
+    {
+        // Whether a request speaks only of files that were not known before, and since when it is there [ms since 1970].
+        // Such files can be merged by anybody, and whoever took them in does that himself if he lives.
+        QStringLiteral("ALTER TABLE build_request ADD COLUMN adds SMALLINT NOT NULL DEFAULT 0"),
+        QStringLiteral("ALTER TABLE build_request ADD COLUMN since BIGINT NOT NULL DEFAULT 0"),
+        // Files that were removed here and are still on the disk: whoever looks for files that an older database does not
+        // know must not bring these back.
+        QStringLiteral("CREATE TABLE forgotten_file (path {bytes} NOT NULL PRIMARY KEY)"),
+    },
 };
 
 QString firstRow(SqlConnection& connection, const QString& question)
@@ -231,11 +240,12 @@ void bringSchemaUpToDate(SqlConnection& connection)
     const int version = schemaVersion(connection);
     // Nearly always so, and then nobody waits for a turn to write.
     if (version == currentSchemaVersion())
-        return;
+        return connection.holdToSchema(version);
     if (version == 0)
         for (const QString& statement : SqlDialect::of(connection.address().engine).beforeSchema)
             executePatiently(connection, statement);
     connection.transact(SqlConnection::Access::Write, [&] { migrate(connection); });
+    connection.holdToSchema(currentSchemaVersion());
 }
 
 void requireSchema(SqlConnection& connection)
@@ -250,6 +260,7 @@ void requireCurrentSchema(SqlConnection& connection)
     const int version = schemaVersion(connection);
     if (version != currentSchemaVersion())
         refuse(version);
+    connection.holdToSchema(version);
 }
 
 }  // namespace Kxg

@@ -140,6 +140,9 @@ Kdd::Result SqlCatalogue::removeFiles(const QVector<QByteArray>& paths)
                 if (rows.next())
                     touched.insert(rows.number(0));
             }
+            mConnection.change("INSERT INTO forgotten_file (path) SELECT path FROM file WHERE path = ?"
+                               " ON CONFLICT (path) DO NOTHING",
+                               {bytesValue(path)});
             mConnection.change("DELETE FROM file WHERE path = ?", {bytesValue(path)});
         }
         QMap<QByteArray, qint64> requests;
@@ -156,11 +159,13 @@ Kdd::Result SqlCatalogue::removeFiles(const QByteArray& studyUID, const QByteArr
 {
     return transact(Access::Write, [&] {
         const qint64 studyId = findStudyId(mConnection, studyUID);
-        const QByteArray sql =
-            "DELETE FROM file WHERE series_id IN (SELECT id FROM series WHERE study_id = ?" + condition;
+        const QByteArray meant = " WHERE series_id IN (SELECT id FROM series WHERE study_id = ?" + condition;
         QMap<QByteArray, qint64> requests;
+        mConnection.change("INSERT INTO forgotten_file (path) SELECT path FROM file" + meant +
+                               " ON CONFLICT (path) DO NOTHING",
+                           QVariantList{studyId} + values);
         // Nothing was listed there, so there is nothing to build.
-        if (mConnection.change(sql, QVariantList{studyId} + values) == 0)
+        if (mConnection.change("DELETE FROM file" + meant, QVariantList{studyId} + values) == 0)
             return;
         showNewestOfAll(mConnection, studyId);
         concludeChange(mConnection, studyId, requests);
@@ -183,6 +188,20 @@ Kdd::Result SqlCatalogue::removeImage(const QByteArray& studyUID, const QByteArr
                        // An image without UID is named by its path.
                        ") AND kind = 1 AND ((sop_uid = ? AND sop_uid <> '') OR (sop_uid = '' AND path = ?))",
                        {textValue(sopUID), bytesValue(sopUID)});
+}
+
+Kdd::Result SqlCatalogue::forgottenFiles(const QByteArray& path, QSet<QByteArray>& paths)
+{
+    const QByteArray folder = withoutSlash(path);
+    return transact(Access::Read, [&] {
+        QSet<QByteArray> found;
+        SqlRows rows = mConnection.ask("SELECT path FROM forgotten_file WHERE path = ? UNION ALL"
+                                       " SELECT path FROM forgotten_file WHERE path >= ? AND path < ?",
+                                       {bytesValue(folder), folder + '/', folder + '0'});
+        while (rows.next())
+            found.insert(rows.bytes(0));
+        paths.swap(found);
+    });
 }
 
 // ---- corrections

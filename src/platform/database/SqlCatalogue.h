@@ -36,6 +36,9 @@ public:
     Kdd::Result claimNext(const QSet<int>& except, std::unique_ptr<StudyClaim>& claim) override;
     Kdd::Result claim(const QByteArray& studyUID, int patienceMs, std::unique_ptr<StudyClaim>& claim,
                       IfAbsent ifAbsent) override;
+    Kdd::Result claimRested(const QSet<int>& except, int restMs, std::unique_ptr<StudyClaim>& claim) override;
+    Kdd::Result additions(const QByteArray& studyUID, QVector<qint64>& requests) override;
+    Kdd::Result forgottenFiles(const QByteArray& path, QSet<QByteArray>& paths) override;
     Kdd::Result finishRequests(const QVector<qint64>& requests) override;
 
     Kdd::Result setConfig(const QByteArray& section, const QByteArray& key, const QByteArray& value) override;

@@ -169,6 +169,7 @@ void SqlConnection::transact(Access access, const std::function<void()>& work)
 {
     begin(access);
     try {
+        checkSchema();
         work();
         // What was read of a fixed file while somebody changed it may be anything.
         if (access == Access::Read && mOpened->file.isFixed() && mOpened->file.isAnother())
@@ -179,6 +180,20 @@ void SqlConnection::transact(Access access, const std::function<void()>& work)
         rollBack();
         throw;
     }
+}
+
+/// Within the transaction: whoever changes tables waits for it, or it for him.
+void SqlConnection::checkSchema()
+{
+    if (mSchemaVersion == 0)
+        return;
+    SqlRows rows = ask("SELECT version FROM schema_version");
+    const qint64 version = rows.next() ? rows.number(0) : 0;
+    if (version != mSchemaVersion)
+        throw DatabaseError(
+            QStringLiteral("its tables have version %1 by now, this program works with version %2")
+                .arg(version)
+                .arg(mSchemaVersion));
 }
 
 // ---- statements

@@ -92,6 +92,10 @@ public:
     /// The same for a statement of which there are too many to be kept; until the next one of these.
     SqlRows askOnce(const QByteArray& sql, const QVariantList& values);
 
+    /// From now on a transaction begins only while the tables have this version: another program may change them at any
+    /// time, and one that does not know them must neither write nor read them.
+    void holdToSchema(int version) { mSchemaVersion = version; }
+
     /// How many rows were changed.
     int change(const QByteArray& sql, const QVariantList& values = {});
 
@@ -106,6 +110,7 @@ private:
     void begin(Access access);
     void beginOnce(Access access);
     void rollBack() noexcept;
+    void checkSchema();
     bool isAlive();
     void open(IfAbsent ifAbsent);
 
@@ -113,6 +118,7 @@ private:
     std::unique_ptr<Opened> mOpened;
     std::map<QByteArray, QSqlQuery> mStatements;  // of mOpened, and gone before it
     std::unique_ptr<QSqlQuery> mOnce;             // likewise
+    int mSchemaVersion = 0;                       // that the tables are to have; 0: any
 };
 
 }  // namespace Kxg

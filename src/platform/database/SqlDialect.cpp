@@ -56,6 +56,8 @@ SqlDialect postgres()
         // Named, for a server may be set up for another: then a writer would not see what was written while he waited.
         << QStringLiteral("BEGIN ISOLATION LEVEL READ COMMITTED")
         << QStringLiteral("SELECT pg_advisory_xact_lock(%1, %2)").arg(kAdvisoryLocks).arg(kWriterLock);
+    // Told at the transaction's end, and once however often it is said in one.
+    dialect.tellOfWork = QStringLiteral("NOTIFY ") + QLatin1String(kWorkChannel);
     // A function that looks a name up, such as to_regclass, would answer from a cache within a transaction that waited
     // for another one to make the table.
     dialect.hasSchema =

@@ -20,6 +20,8 @@ struct SqlDialect
     QStringList beginReading;
     QStringList beginWriting;
 
+    QString tellOfWork;  ///< a statement that wakes those who wait for work; empty: there is none
+
     QString hasSchema;  ///< a question that gives one number, not 0 when there is a table "schema_version"
 
     // column types, named {id}, {key}, {text} and {bytes} in the schema
@@ -44,5 +46,8 @@ struct SqlDialect
 /// The numbered locks that we take on a PostgreSQL server, beside a number: a study's id, or this one for writing.
 constexpr int kAdvisoryLocks = 0x4b444442;
 constexpr int kWriterLock = -1;
+
+/// The channel on which such a server tells of work.
+constexpr char kWorkChannel[] = "kdd_work";
 
 }  // namespace Kxg

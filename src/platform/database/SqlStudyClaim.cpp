@@ -8,6 +8,7 @@
 #include <QElapsedTimer>
 #include <QThread>
 
+#include <limits>
 #include <utility>
 
 namespace Kxg
@@ -90,6 +91,8 @@ public:
         // A build that left something out keeps the requests, and with them the study's place in the queue.
         return conclude(built.isComplete ? mStudy.requests : QVector<qint64>(), [&] {
             keep(built);
+            if (!built.isComplete)
+                keepWaiting();
             if (built.settleAt > 0)
                 leaveRequest(mConnection, mStudyId, built.settleAt);
         });
@@ -97,12 +100,18 @@ public:
 
     Kdd::Result finishChange(const BuiltStudy& built, qint64 request) override
     {
-        return conclude({request}, [&] { keep(built); });
+        return conclude({request}, [&] {
+            keep(built);
+            keepWaiting();
+        });
     }
 
     Kdd::Result noteSearch(const BuiltStudy& built) override
     {
-        return conclude({}, [&] { keepSearch(built); });
+        return conclude({}, [&] {
+            keepSearch(built);
+            keepWaiting();
+        });
     }
 
     Kdd::Result finishRemoved() override
@@ -144,6 +153,12 @@ private:
         mConnection.change("UPDATE study SET tag_file_size = ?, tag_file_digest = ? WHERE id = ?",
                            {built.tagFile.size, bytesValue(built.tagFile.digest), mStudyId});
         describe(built.series);
+    }
+
+    /// The tag file may name files by now that nobody has read: for what is left to be done all of them are.
+    void keepWaiting()
+    {
+        mConnection.change("UPDATE build_request SET adds = 0 WHERE study_id = ? AND adds = 1", {mStudyId});
     }
 
     void keepSearch(const BuiltStudy& built)
@@ -203,14 +218,15 @@ struct Request
     qint64 studyId = 0;
 };
 
-/// The requests after `last`, in the order in which they came.
-std::vector<Request> pageOfQueue(SqlConnection& connection, qint64 last)
+/// The requests after `last`, in the order in which they came; of those that only added files the ones that were left
+/// up to `addedUntil`.
+std::vector<Request> pageOfQueue(SqlConnection& connection, qint64 last, qint64 addedUntil)
 {
     std::vector<Request> page;
     connection.transact(SqlConnection::Access::Read, [&] {
-        SqlRows rows = connection.ask(
-            "SELECT id, study_id FROM build_request WHERE id > ? AND due <= ? ORDER BY id LIMIT ?",
-            {last, presentMs(), kPageOfQueue});
+        SqlRows rows = connection.ask("SELECT id, study_id FROM build_request WHERE id > ? AND due <= ?"
+                                      " AND (adds = 0 OR since <= ?) ORDER BY id LIMIT ?",
+                                      {last, presentMs(), addedUntil, kPageOfQueue});
         while (rows.next())
             page.push_back({rows.number(0), rows.number(1)});
     });
@@ -221,8 +237,9 @@ std::vector<Request> pageOfQueue(SqlConnection& connection, qint64 last)
 class QueueWalk
 {
 public:
-    explicit QueueWalk(SqlConnection& connection)
+    QueueWalk(SqlConnection& connection, qint64 addedUntil)
         : mConnection(connection)
+        , mAddedUntil(addedUntil)
     {
     }
 
@@ -233,8 +250,8 @@ public:
         std::unique_ptr<StudyClaim> claim;
         qint64 last = 0;
         // By number and not by counting rows, since requests come and go while the queue is walked.
-        for (auto page = pageOfQueue(mConnection, last); !claim && !page.empty();
-             page = pageOfQueue(mConnection, last)) {
+        for (auto page = pageOfQueue(mConnection, last, mAddedUntil); !claim && !page.empty();
+             page = pageOfQueue(mConnection, last, mAddedUntil)) {
             last = page.back().id;
             claim = claimOneOf(page);
         }
@@ -271,6 +288,7 @@ private:
     }
 
     SqlConnection& mConnection;
+    const qint64 mAddedUntil;  // [ms since the epoch]
     std::unique_ptr<StudyLock>
         mLock;             // made when there is something to lock: it may be a connection to a server
     QSet<qint64> mPassed;  // studies
@@ -314,8 +332,10 @@ Kdd::Result SqlCatalogue::requestBuild(const QVector<QByteArray>& studyUIDs, IfG
 
 Kdd::Result SqlCatalogue::settleNow()
 {
-    return transact(Access::Write,
-                    [&] { mConnection.change("UPDATE build_request SET due = 0 WHERE due > 0"); });
+    return transact(Access::Write, [&] {
+        if (mConnection.change("UPDATE build_request SET due = 0 WHERE due > 0") > 0)
+            tellOfWork(mConnection);
+    });
 }
 
 Kdd::Result SqlCatalogue::countWaiting(int& studies)
@@ -331,7 +351,30 @@ Kdd::Result SqlCatalogue::countWaiting(int& studies)
 Kdd::Result SqlCatalogue::claimNext(const QSet<int>& except, std::unique_ptr<StudyClaim>& claim)
 {
     claim.reset();
-    return attempt(mConnection.address(), [&] { claim = QueueWalk(mConnection).claimFirst(except); });
+    return attempt(mConnection.address(), [&] {
+        claim = QueueWalk(mConnection, std::numeric_limits<qint64>::max()).claimFirst(except);
+    });
+}
+
+Kdd::Result SqlCatalogue::claimRested(const QSet<int>& except, int restMs, std::unique_ptr<StudyClaim>& claim)
+{
+    claim.reset();
+    return attempt(mConnection.address(),
+                   [&] { claim = QueueWalk(mConnection, presentMs() - restMs).claimFirst(except); });
+}
+
+Kdd::Result SqlCatalogue::additions(const QByteArray& studyUID, QVector<qint64>& requests)
+{
+    return transact(Access::Read, [&] {
+        QVector<qint64> found;
+        SqlRows rows = mConnection.ask("SELECT build_request.id FROM build_request JOIN study"
+                                       " ON study.id = build_request.study_id"
+                                       " WHERE study.uid = ? AND adds = 1 ORDER BY build_request.id",
+                                       {textValue(studyUID)});
+        while (rows.next())
+            found.push_back(rows.number(0));
+        requests.swap(found);
+    });
 }
 
 Kdd::Result SqlCatalogue::claim(const QByteArray& studyUID, int patienceMs,

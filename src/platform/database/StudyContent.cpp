@@ -2,6 +2,7 @@
 
 #include "platform/database/SearchRows.h"
 #include "platform/database/SqlConnection.h"
+#include "platform/database/SqlDialect.h"
 
 #include <QDateTime>
 
@@ -52,23 +53,39 @@ KeptNode obtainSeries(SqlConnection& connection, qint64 studyId, const QByteArra
                   {studyId, textValue(seriesUID)});
 }
 
-qint64 leaveRequest(SqlConnection& connection, qint64 studyId, qint64 due)
+qint64 leaveRequest(SqlConnection& connection, qint64 studyId, qint64 due, Reason reason)
 {
-    // Selected from the table, so that a study that is gone gets no request.
-    SqlRows rows = connection.ask("INSERT INTO build_request (study_id, due)"
-                                  " SELECT id, CAST(? AS BIGINT) FROM study WHERE id = ? RETURNING id",
-                                  {due, studyId});
-    return rows.next() ? rows.number(0) : 0;
+    const bool isAddition = reason == Reason::Added;
+    qint64 request = 0;
+    {
+        // Selected from the table, so that a study that is gone gets no request.
+        SqlRows rows = connection.ask("INSERT INTO build_request (study_id, due, adds, since)"
+                                      " SELECT id, CAST(? AS BIGINT), CAST(? AS SMALLINT), CAST(? AS BIGINT)"
+                                      " FROM study WHERE id = ? RETURNING id",
+                                      {due, isAddition ? 1 : 0, presentMs(), studyId});
+        request = rows.next() ? rows.number(0) : 0;
+    }
+    if (request != 0 && due == 0 && !isAddition)
+        tellOfWork(connection);
+    return request;
 }
 
-void concludeChange(SqlConnection& connection, qint64 studyId, QMap<QByteArray, qint64>& requests)
+void tellOfWork(SqlConnection& connection)
+{
+    const QString& tell = SqlDialect::of(connection.address().engine).tellOfWork;
+    if (!tell.isEmpty())
+        connection.execute(tell);
+}
+
+void concludeChange(SqlConnection& connection, qint64 studyId, QMap<QByteArray, qint64>& requests,
+                    Reason reason)
 {
     // Before the request is left, so that whoever reads the study for it finds no series without files.
     connection.change("DELETE FROM series WHERE study_id = ?"
                       " AND NOT EXISTS (SELECT 1 FROM file WHERE file.series_id = series.id)",
                       {studyId});
     putRegisteredRows(connection, studyId);
-    const qint64 request = leaveRequest(connection, studyId);
+    const qint64 request = leaveRequest(connection, studyId, 0, reason);
     SqlRows rows = connection.ask("SELECT uid FROM study WHERE id = ?", {studyId});
     if (rows.next())
         requests.insert(rows.text(0), request);

@@ -27,13 +27,25 @@ struct KeptNode
 KeptNode obtainStudy(SqlConnection& connection, const QByteArray& studyUID);
 KeptNode obtainSeries(SqlConnection& connection, qint64 studyId, const QByteArray& seriesUID);
 
+/// Why a study is to be built.
+enum class Reason {
+    Changed,
+    Added,  ///< nothing happened but that files came that were not known before
+};
+
 /// To be called once for each study touched, after everything else: removes its series that have become empty, leaves a
 /// request to build it and enters that by the study's UID. The study itself stays, also without files: whoever builds it
 /// then removes its tag file.
-void concludeChange(SqlConnection& connection, qint64 studyId, QMap<QByteArray, qint64>& requests);
+void concludeChange(SqlConnection& connection, qint64 studyId, QMap<QByteArray, qint64>& requests,
+                    Reason reason = Reason::Changed);
 
 /// Leaves a request to build the study that counts from `due` on [ms since the epoch]; 0 when there is no such study.
-qint64 leaveRequest(SqlConnection& connection, qint64 studyId, qint64 due = 0);
+/// Workers are told of one that counts at once, but for what was only added: whoever took that in completes the study.
+qint64 leaveRequest(SqlConnection& connection, qint64 studyId, qint64 due = 0,
+                    Reason reason = Reason::Changed);
+
+/// Wakes those who wait for work, when the transaction comes to its end; nobody where the engine cannot.
+void tellOfWork(SqlConnection& connection);
 
 /// So many numbers of registration; the first of them.
 qint64 takeRegistrationNumbers(SqlConnection& connection, qint64 count);

@@ -1,21 +1,18 @@
 #include "server/Server.h"
 #include "tools/kdd/Commands.h"
 #include "tools/kdd/Report.h"
+#include "tools/kdd/ServerSignals.h"
 #include "tools/kdd/Store.h"
 
 #include <QFile>
 
-#include <fcntl.h>
 #include <kddlib/ExResource.h>
 #include <kddlib/Kxg.h>
 #include <kddlib/LogFile.h>
 #include <kddlib/PathName.h>
-#include <unistd.h>
 
 #include <algorithm>
-#include <csignal>
 #include <cstdio>
-#include <functional>
 #include <memory>
 #include <thread>
 
@@ -38,49 +35,6 @@ struct ServeRequest
     QByteArray publicAddress;
     QList<QByteArray> hosts;
     bool stow = false;
-};
-
-/// Whether the process would go with a terminal that is closed. nohup has that signal ignored.
-bool belongsToTerminal()
-{
-    struct sigaction action = {};
-    const int terminal = ::open("/dev/tty", O_RDONLY | O_CLOEXEC | O_NOCTTY);
-    if (terminal >= 0)
-        ::close(terminal);
-    return terminal >= 0 && ::sigaction(SIGHUP, nullptr, &action) == 0 && action.sa_handler == SIG_DFL;
-}
-
-/// While it lives the signals that are meant for a server wait to be asked for, by threads that are started meanwhile too.
-class ServerSignals
-{
-public:
-    ServerSignals()
-    {
-        sigemptyset(&mSignals);
-        sigaddset(&mSignals, SIGINT);
-        sigaddset(&mSignals, SIGTERM);
-        if (!belongsToTerminal())
-            sigaddset(&mSignals, SIGHUP);
-        ::pthread_sigmask(SIG_BLOCK, &mSignals, &mFormer);
-    }
-    ~ServerSignals() { ::pthread_sigmask(SIG_SETMASK, &mFormer, nullptr); }
-    ServerSignals(const ServerSignals&) = delete;
-    ServerSignals& operator=(const ServerSignals&) = delete;
-
-    /// Returns with the first one that ends the process; a second one ends it at once.
-    void awaitEnd(const std::function<void()>& renew) const
-    {
-        int signal = SIGHUP;
-        for (::sigwait(&mSignals, &signal); signal == SIGHUP; ::sigwait(&mSignals, &signal))
-            renew();
-        std::signal(SIGINT, SIG_DFL);
-        std::signal(SIGTERM, SIG_DFL);
-        ::pthread_sigmask(SIG_UNBLOCK, &mSignals, nullptr);
-    }
-
-private:
-    sigset_t mSignals = {};
-    sigset_t mFormer = {};
 };
 
 QVector<QByteArray> wordsOf(QByteArray text)

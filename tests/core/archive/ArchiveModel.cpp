@@ -58,8 +58,10 @@ std::set<std::string> ArchiveModel::registerAll(const std::vector<std::string>& 
     std::set<std::string> touched;
     for (const std::string& path : paths) {
         const auto former = mRegistered.find(path);
-        if (former != mRegistered.end())
+        if (former != mRegistered.end()) {
             touched.insert(former->second.file.study);
+            mChanged.insert(former->second.file.study);
+        }
         mRegistered[path] = {mDisk.at(path), ++mLastNumber, mVersions.at(path)};
         touched.insert(mDisk.at(path).study);
     }
@@ -80,7 +82,7 @@ bool ArchiveModel::add(const std::string& folder)
         const ModelFile& file = mDisk.at(path);
         arrivals[file.study][keyOf(path, file)] = {path, file};
     }
-    const std::set<std::string> waitedBefore = mWaiting;
+    const std::set<std::string> changedBefore = mChanged;
     const std::set<std::string> touched = registerAll(paths);
     mWaiting.insert(touched.begin(), touched.end());
     const bool hasUnchanged = std::any_of(mDisk.begin(), mDisk.end(), [&](const auto& file) {
@@ -89,7 +91,7 @@ bool ArchiveModel::add(const std::string& folder)
     });
     bool isDone = true;
     for (const auto& study : arrivals)
-        complete(study.first, study.second, waitedBefore.count(study.first) == 0, isDone);
+        complete(study.first, study.second, changedBefore.count(study.first) == 0, isDone);
     std::set<std::string> left;
     for (const std::string& study : touched) {
         if (arrivals.count(study) == 0)
@@ -160,10 +162,34 @@ bool ArchiveModel::canMerge(const std::string& study, const ModelStudy& arrivals
                        [&](const auto& image) { return wanted.count(image.first) > 0; });
 }
 
-/// `isAlone`: nothing else waited to be taken into account.
-void ArchiveModel::complete(const std::string& study, const ModelStudy& arrivals, bool isAlone, bool& isDone)
+/// What was registered before and nobody has taken in comes along from the disk. False when that is more than half of
+/// all, or is not there as it was registered.
+bool ArchiveModel::bringListed(const std::string& study, ModelStudy& arrivals) const
 {
-    if (!isAlone || !canMerge(study, arrivals)) {
+    const auto holds = [](const ModelStudy& content, const auto& listed) {
+        const auto found = content.find(listed.first);
+        return found != content.end() && found->second.path == listed.second.path;
+    };
+    std::size_t absent = 0;
+    const ModelStudy wanted = listedImages(study);
+    for (const auto& listed : wanted) {
+        if (holds(arrivals, listed) || holds(mTagFiles.at(study), listed))
+            continue;
+        const auto file = mDisk.find(listed.second.path);
+        const ModelFile& known = listed.second.shows;
+        if (file == mDisk.end() || file->second.study != known.study || file->second.series != known.series ||
+            file->second.sop != known.sop)
+            return false;
+        arrivals[listed.first] = {listed.second.path, file->second};
+        ++absent;
+    }
+    return 2 * absent <= wanted.size();
+}
+
+/// `isAlone`: nothing waited to be taken into account but files that had come.
+void ArchiveModel::complete(const std::string& study, ModelStudy arrivals, bool isAlone, bool& isDone)
+{
+    if (!isAlone || !isTrusted(study) || !bringListed(study, arrivals) || !canMerge(study, arrivals)) {
         isDone = build(study) && isDone;
         return;
     }
@@ -206,7 +232,10 @@ bool ArchiveModel::build(const std::string& study)
     }
     if (isWhole) {
         mWaiting.erase(study);
+        mChanged.erase(study);
         mUnsettled.erase(study);
+    } else {
+        mChanged.insert(study);
     }
     mMarked.erase(study);
     return isWhole;
@@ -224,8 +253,10 @@ bool ArchiveModel::buildWaiting()
 bool ArchiveModel::buildAll(bool again)
 {
     for (const std::string& study : listed()) {
-        if (again || !isTrusted(study))
+        if (again || !isTrusted(study)) {
             mWaiting.insert(study);
+            mChanged.insert(study);
+        }
     }
     return buildWaiting();
 }
@@ -233,6 +264,7 @@ bool ArchiveModel::buildAll(bool again)
 bool ArchiveModel::settle()
 {
     mWaiting.insert(mUnsettled.begin(), mUnsettled.end());
+    mChanged.insert(mUnsettled.begin(), mUnsettled.end());
     return buildWaiting();
 }
 
@@ -282,6 +314,7 @@ bool ArchiveModel::remove(const std::string& study, const std::string& series, c
             holdsAll && present->count(each.first) > 0 && present->at(each.first).path == each.second.path;
     if (!holdsAll) {
         mWaiting.insert(study);
+        mChanged.insert(study);
         return build(study);
     }
     for (auto it = present->begin(); it != present->end();)
@@ -309,6 +342,8 @@ bool ArchiveModel::sync(const std::string& study)
     mMarked.insert(study);
     if (!wasTrusted)
         mWaiting.insert(study);
+    if (isWaiting(study))
+        mChanged.insert(study);
     return true;
 }
 

@@ -101,7 +101,8 @@ private:
     ModelFile edited(const std::string& key, ModelFile file) const;
     bool isCorrected(const std::string& study) const;
     bool canMerge(const std::string& study, const ModelStudy& arrivals) const;
-    void complete(const std::string& study, const ModelStudy& arrivals, bool isAlone, bool& isDone);
+    bool bringListed(const std::string& study, ModelStudy& arrivals) const;
+    void complete(const std::string& study, ModelStudy arrivals, bool isAlone, bool& isDone);
     bool build(const std::string& study);
     void put(const std::string& study, ModelStudy content);
     void forgetTagFile(const std::string& study);
@@ -116,6 +117,7 @@ private:
     std::set<std::string> mIsThere;               // also those that cannot
     std::set<std::string> mSpoiled;               // not what was written last
     std::set<std::string> mWaiting;
+    std::set<std::string> mChanged;  // of which more happened, since they were built, than that files came
     std::set<std::string> mUnsettled;
     std::set<std::string> mMarked;  // by a sync or a correction, which change the tag file as it is
     std::map<std::pair<std::string, std::string>, std::string> mEdits;  // of studies and images

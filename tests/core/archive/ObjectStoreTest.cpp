@@ -130,6 +130,37 @@ TEST_F(ObjectStoreTest, MergesArrivalsWithoutOpeningTheirFilesAgain)
     EXPECT_EQ(file.imagesByUID().size(), 3);
 }
 
+TEST_F(ObjectStoreTest, MergesWhatAnotherServerTookAlongAndThatOneHasNothingLeft)
+{
+    ArrivedStudies one;
+    ArrivedStudies other;
+    const auto database = catalogue();
+    const auto objectsOfOne = open(one);
+    const auto objectsOfOther = open(other);
+    for (const char* uid : {"1.2.3.1", "1.2.3.2", "1.2.3.3"})
+        store(*objectsOfOne, *database, anImage(uid));
+    ASSERT_TRUE(one.complete("1.2", *database, 0).good());
+    // A build would not be whole any more.
+    QFile::remove(mFolder.filePath("objects/1.2/1.2.3/1.2.3.1.dcm"));
+    const auto expectHeld = [&](ArrivedStudies& by, int images) {
+        EXPECT_TRUE(by.complete("1.2", *database, 0).good());
+        TagFile file;
+        ASSERT_TRUE(file.readCacheFileForStudy("1.2", false));
+        EXPECT_EQ(file.imagesByUID().size(), images);
+        return;
+    };
+    store(*objectsOfOne, *database, anImage("1.2.3.4"));
+    store(*objectsOfOther, *database, anImage("1.2.3.5"));
+    expectHeld(one, 5);
+    store(*objectsOfOne, *database, anImage("1.2.3.6"));
+    expectHeld(other, 6);
+    EXPECT_FALSE(other.isWaiting("1.2"));
+    const QByteArray written = fileContent(TagFile::cacheFilePathForStudy("1.2"));
+    expectHeld(one, 6);
+    EXPECT_EQ(fileContent(TagFile::cacheFilePathForStudy("1.2")), written);
+    EXPECT_EQ(waiting(), "");
+}
+
 TEST_F(ObjectStoreTest, TakesWhatTwoSendInOppositeOrderOnce)
 {
     ArrivedStudies studies;

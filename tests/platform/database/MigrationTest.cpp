@@ -81,9 +81,10 @@ TEST_P(MigrationTest, ADatabaseOfTheSecondSchemaKnowsWhichFilesACorrectionMoved)
     add({dicom("/d/a", "1", "1.1", "x"), dicom("/d/b", "1", "1.1", "")});
     correct({{"1", "x", "2", "2.1", "y", "changes"}, {"1", "/d/b", "2", "2.1", "/d/b", "changes"}});
     for (const char* backwards :
-         {"DROP TABLE change", "DROP TABLE series_request", "DROP TABLE series_search",
+         {"DROP TABLE forgotten_file", "DROP TABLE change", "DROP TABLE series_request", "DROP TABLE series_search",
           "DROP TABLE study_modality", "DROP TABLE IF EXISTS study_parts", "DROP TABLE study_words",
           "DROP TABLE study_answer", "DROP TABLE study_search", "DROP INDEX file_of_correction",
+          "ALTER TABLE build_request DROP COLUMN adds", "ALTER TABLE build_request DROP COLUMN since",
           "ALTER TABLE file DROP COLUMN correction_id", "UPDATE schema_version SET version = 2"})
         execute(backwards);
     open();  // and bring it up to date
@@ -99,9 +100,10 @@ TEST_P(MigrationTest, ADatabaseOfTheThirdSchemaIsFoundBySearchesOnceItIsPrepared
     file.modality = "CT";
     add({file});
     for (const char* backwards :
-         {"DROP TABLE change", "DROP TABLE series_request", "DROP TABLE series_search",
+         {"DROP TABLE forgotten_file", "DROP TABLE change", "DROP TABLE series_request", "DROP TABLE series_search",
           "DROP TABLE study_modality", "DROP TABLE IF EXISTS study_parts", "DROP TABLE study_words",
-          "DROP TABLE study_answer", "DROP TABLE study_search", "UPDATE schema_version SET version = 3"})
+          "DROP TABLE study_answer", "DROP TABLE study_search", "ALTER TABLE build_request DROP COLUMN adds",
+          "ALTER TABLE build_request DROP COLUMN since", "UPDATE schema_version SET version = 3"})
         execute(backwards);
     Kdd::Result result;
     const auto search = StudySearch::open(address(), result);
@@ -114,6 +116,24 @@ TEST_P(MigrationTest, ADatabaseOfTheThirdSchemaIsFoundBySearchesOnceItIsPrepared
     ASSERT_EQ(found.size(), 1u);
     EXPECT_EQ(found[0].modalities, "CT");
     EXPECT_TRUE(found[0].attributes.contains("Müller^Eva")) << found[0].attributes.toStdString();
+}
+
+TEST_P(MigrationTest, AProgramThatRunsOnNeitherWritesNorReadsTablesItDoesNotKnow)
+{
+    add({dicom("/d/a", "1", "1.1", "x")});
+    std::shared_ptr<DicomDirectoryEntry> study;
+    ASSERT_TRUE(GetStudy("1", study).good());
+    execute("UPDATE schema_version SET version = version + 1");
+    Requests requests;
+    std::unique_ptr<StudyClaim> claim;
+    const Kxg::FileRecords files{{dicom("/d/b", "1", "1.1", "y")}, {}, {}};
+    for (const Kdd::Result& result :
+         {catalogue().registerFiles(files, requests), GetStudy("1", study), catalogue().claimNext({}, claim)})
+        EXPECT_TRUE(result.text().contains(QLatin1String("this program works with version")))
+            << qPrintable(result.text());
+    execute("UPDATE schema_version SET version = version - 1");
+    EXPECT_EQ(studies(), "1   1/1/0*\n");
+    EXPECT_TRUE(GetStudy("1", study).good());
 }
 
 }  // namespace

@@ -114,6 +114,26 @@ TEST_P(QueueTest, AKilledProcessGivesItsStudyBack)
     EXPECT_EQ(studies(), "1   1/1/0*\n");
 }
 
+TEST_P(QueueTest, FreshArrivalsAreLeftToThoseWhoTookThem)
+{
+    const auto isGiven = [&](int restMs) {
+        std::unique_ptr<StudyClaim> claim;
+        EXPECT_EQ(catalogue().claimRested({}, restMs, claim).text().toStdString(), "");
+        return claim != nullptr;
+    };
+    constexpr int kDay = 24 * 3600 * 1000;
+    addStudies(1);
+    EXPECT_FALSE(isGiven(kDay));
+    EXPECT_TRUE(isGiven(0)) << "as if they were old";
+    const qint64 added = add({dicom("/d/more", "1", "1", "2")}).value("1");
+    EXPECT_FALSE(isGiven(kDay));
+    const qint64 changed = add({dicom("/d/more", "1", "1", "2")}).value("1");
+    EXPECT_TRUE(isGiven(kDay)) << "a known file was registered anew";
+    QVector<qint64> additions;
+    ASSERT_TRUE(catalogue().additions("1", additions).good());
+    EXPECT_TRUE(additions.contains(added) && !additions.contains(changed) && additions.size() == 2);
+}
+
 TEST_P(QueueTest, AllWhoMakeTheDatabaseAtOnceSucceed)
 {
     std::atomic<int> opened{0};

@@ -1,6 +1,7 @@
 #include "kddlib/archive/StudyCompletion.h"
 
 #include "kddlib/TagFileGenerator.h"
+#include "kddlib/archive/DicomInput.h"
 #include "kddlib/tagfile/StudyRecord.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
@@ -29,6 +30,30 @@ CompletedStudy failed(const char* format, const QByteArray& studyUID, const QStr
     return completed;
 }
 
+/// Whether the tree has the image from the file that counts.
+bool holds(const TagFile& file, const Kxg::ListedImage& listed)
+{
+    const TagMap* image = file.findImage(listed.key());
+    return image != nullptr && filePathOf(*image) == listed.path;
+}
+
+/// Takes out of the arrivals what the present tag file has from the same files.
+void leaveOutHeld(TagFile& arrivals, const TagFile& present)
+{
+    std::vector<QByteArray> held;
+    const auto& images = arrivals.imagesByUID();
+    for (auto it = images.cbegin(); it != images.cend(); ++it) {
+        const TagMap* image = present.findImage(it.key());
+        if (image != nullptr && filePathOf(*image) == filePathOf(*it.value()))
+            held.push_back(it.key());
+    }
+    std::vector<const char*> keys;
+    keys.reserve(held.size());
+    for (const QByteArray& key : held)
+        keys.push_back(key.constData());
+    arrivals.removeImages(static_cast<int>(keys.size()), keys.data());
+}
+
 /// A study whose tag file shows the order in which it came about.
 Kxg::BuiltStudy unsettled(const TagFile& file)
 {
@@ -52,7 +77,13 @@ CompletedStudy StudyCompletion::completeRead(Kxg::StudyClaim& claim, TagFile& ar
     if (mContents.images.empty())
         return remove(claim);
     TagFile present;
-    if (canMerge(claim.studyInstanceUID(), arrivals, requests, present))
+    const QByteArray& studyUID = claim.studyInstanceUID();
+    // Others have done what was asked for here.
+    if (!isChanged() && !requests.isEmpty() &&
+        isTagFile(TagFile::cacheFilePathForStudy(studyUID.constData()), mContents.tagFile) &&
+        present.readWhenFreeForStudy(studyUID.constData(), false))
+        return {{}, false, present.statistics()};
+    if (canMerge(studyUID, arrivals, requests, present))
         return merge(claim, arrivals, present);
     return build(claim, arrivals);
 }
@@ -148,19 +179,54 @@ bool StudyCompletion::isTrusted(const QByteArray& studyUID) const
            isTagFile(TagFile::cacheFilePathForStudy(studyUID.constData()), mContents.tagFile);
 }
 
-bool StudyCompletion::canMerge(const QByteArray& studyUID, const TagFile& arrivals,
-                               const QVector<qint64>& requests, TagFile& present) const
+/// With the arrivals that others have taken, of which only the catalogue tells, in `arrivals` too.
+bool StudyCompletion::canMerge(const QByteArray& studyUID, TagFile& arrivals, const QVector<qint64>& requests,
+                               TagFile& present) const
 {
+    QVector<qint64> additions;
+    if (mContents.changes.isEmpty() || mCatalogue.additions(studyUID, additions).bad())
+        return false;
     // A file of the same path and image may have been registered with other content.
-    const bool isAlone = std::all_of(mContents.changes.begin(), mContents.changes.end(),
-                                     [&](qint64 request) { return requests.contains(request); });
+    const bool isAlone = std::all_of(mContents.changes.begin(), mContents.changes.end(), [&](qint64 request) {
+        return requests.contains(request) || additions.contains(request);
+    });
     // What costs least is asked first: whether the tag file is the one written last, and what it holds, only
     // when nothing else speaks against merging.
-    return isAlone && arrivals.studyInstanceUID() == studyUID && isTrusted(studyUID) &&
-           present.readWhenFreeForStudy(studyUID.constData(), false) && holdsListed(arrivals, present) &&
+    if (!isAlone || (!arrivals.isEmpty() && arrivals.studyInstanceUID() != studyUID) ||
+        !isTrusted(studyUID) || !present.readWhenFreeForStudy(studyUID.constData(), false))
+        return false;
+    // Others may have merged them, which they cannot with other content than the one that is here.
+    if (std::all_of(requests.begin(), requests.end(), [&](qint64 each) {
+            return !mContents.changes.contains(each) || additions.contains(each);
+        }))
+        leaveOutHeld(arrivals, present);
+    return bringListed(studyUID, arrivals, present) && !arrivals.isEmpty() &&
+           holdsListed(arrivals, present) &&
            std::all_of(arrivals.imagesByUID().keyBegin(), arrivals.imagesByUID().keyEnd(),
                        [&](const QByteArray& key) { return mListed.contains(key); }) &&
            unlisted(present).empty();
+}
+
+/// Reads the images that are listed and that neither of them holds: others took them in. False when there are so many
+/// that a build costs no more, or one cannot be read as the image that was registered.
+bool StudyCompletion::bringListed(const QByteArray& studyUID, TagFile& arrivals, const TagFile& present) const
+{
+    std::vector<const Kxg::ListedImage*> absent;
+    for (const Kxg::ListedImage& listed : mContents.images) {
+        if (!holds(arrivals, listed) && !holds(present, listed))
+            absent.push_back(&listed);
+    }
+    if (2 * absent.size() > mContents.images.size())
+        return false;
+    for (const Kxg::ListedImage* listed : absent) {
+        DicomInput input = readDicomInput(listed->path, Damage::Refused);
+        if (input.kind != DicomInput::Kind::Image || input.studyUID != studyUID ||
+            input.seriesUID != listed->seriesInstanceUID ||
+            input.map->uid(TagMap::ImageLevel) != listed->sopInstanceUID ||
+            TagFileGenerator::place(arrivals, std::move(input.map), listed->path) == nullptr)
+            return false;
+    }
+    return true;
 }
 
 /// Whether the tag file with the arrivals in it holds every image that is listed, from the file that counts.

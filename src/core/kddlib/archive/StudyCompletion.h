@@ -25,7 +25,8 @@ struct CompletedStudy
 /// - a study without images loses its tag file;
 /// - images that have just arrived are merged into a tag file that holds all the others and is the one that was written
 ///   last, unless something else changed that is not in it yet; it is then built once more when nothing has arrived for
-///   a time (`ExResource::settleSeconds`), because the order of arrival shows in the order of the file;
+///   a time (`ExResource::settleSeconds`), because the order of arrival shows in the order of the file. Images that
+///   arrived at other processes are merged along, from their files;
 /// - from such a tag file images that were removed are taken out, likewise;
 /// - else the tag file is built from all files of the study.
 ///
@@ -42,7 +43,8 @@ public:
     }
 
     /// With images that were loaded already, each with its path in (0006,7100); of another study or not listed they are
-    /// ignored. `requests` are those that registering them left. What `arrivals` holds afterwards is not settled.
+    /// ignored. `requests` are those that registering them left; when nothing of these is left to be done, nothing is.
+    /// What `arrivals` holds afterwards is not settled.
     CompletedStudy complete(Kxg::StudyClaim& claim, TagFile& arrivals, const QVector<qint64>& requests);
 
     /// The same in two steps, for whoever gathers arrivals while others register more of them: `read` takes in what the
@@ -63,8 +65,9 @@ public:
 private:
     static CompletedStudy remove(Kxg::StudyClaim& claim);
     CompletedStudy build(Kxg::StudyClaim& claim, const TagFile& loaded) const;
-    bool canMerge(const QByteArray& studyUID, const TagFile& arrivals, const QVector<qint64>& requests,
+    bool canMerge(const QByteArray& studyUID, TagFile& arrivals, const QVector<qint64>& requests,
                   TagFile& present) const;
+    bool bringListed(const QByteArray& studyUID, TagFile& arrivals, const TagFile& present) const;
     bool isTrusted(const QByteArray& studyUID) const;
     bool holdsListed(const TagFile& arrivals, const TagFile& present) const;
     std::vector<QByteArray> unlisted(const TagFile& present) const;

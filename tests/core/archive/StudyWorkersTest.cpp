@@ -1,0 +1,163 @@
+#include "kddlib/archive/StudyWorkers.h"
+
+#include "kddlib/archive/DicomInput.h"
+#include "kddlib/archive/Registration.h"
+#include "kddlib/tagfile/TagFile.h"
+#include "platform/database/Kxg.h"
+#include "support/DatasetBuilder.h"
+#include "support/FileContent.h"
+#include "support/LogCapture.h"
+#include "support/PostgresServer.h"
+#include "support/TemporaryStore.h"
+
+#include <QFile>
+#include <QThread>
+
+#include <gtest/gtest.h>
+
+using namespace Kdd;
+
+namespace
+{
+
+constexpr StudyWorkers::Pace kSwift = {std::chrono::milliseconds(20), std::chrono::milliseconds(20),
+                                       std::chrono::milliseconds(0), std::chrono::milliseconds(20),
+                                       std::chrono::milliseconds(20)};
+
+class StudyWorkersTest : public testing::TestWithParam<const char*>
+{
+protected:
+    StudyWorkersTest() { Kxg::SetDatabaseServer(mAddress); }
+
+    std::unique_ptr<Kxg::Catalogue> catalogue() const
+    {
+        Result result;
+        auto opened = Kxg::Catalogue::open(mAddress, result);
+        EXPECT_EQ(result.text().toStdString(), "");
+        return opened;
+    }
+
+    /// Of the study "1.N" as many images.
+    void index(int study, int images) const
+    {
+        const auto database = catalogue();
+        Registration registration(*database);
+        for (int i = 1; i <= images; ++i) {
+            const QByteArray uid = "1." + QByteArray::number(study);
+            const QByteArray name = uid + ".3." + QByteArray::number(i);
+            const QString path = mStore.filePath(name.constData());
+            DcmDataset copy(anImage(name.constData())
+                                .inStudy(uid.constData())
+                                .inSeries((uid + ".3").constData())
+                                .build());
+            DcmFileFormat format(&copy);
+            EXPECT_TRUE(format.saveFile(path.toUtf8().constData(), EXS_LittleEndianExplicit).good());
+            EXPECT_TRUE(registration.add(readDicomInput(path.toUtf8(), Damage::Refused)).good());
+        }
+        EXPECT_TRUE(registration.flush().good());
+    }
+
+    int countWaiting() const
+    {
+        int waiting = -1;
+        EXPECT_TRUE(catalogue()->countWaiting(waiting).good());
+        return waiting;
+    }
+
+    /// Looks until it is so, for as long as it takes on a busy machine.
+    template <typename Condition>
+    static bool comesTrue(const Condition& condition)
+    {
+        for (int look = 0; look < 6000 && !condition(); ++look)
+            QThread::yieldCurrentThread();
+        return condition();
+    }
+
+    LogCapture mLog;
+    TemporaryStore mStore;
+    QByteArray mAddress = QByteArray(GetParam()) == "Sqlite"
+                              ? "sqlite:" + mStore.filePath("kdd.sqlite").toUtf8()
+                              : newPostgresDatabase();
+};
+
+INSTANTIATE_TEST_SUITE_P(Engines, StudyWorkersTest, testing::Values("Sqlite", "Postgres"),
+                         [](const auto& engine) { return engine.param; });
+
+TEST_P(StudyWorkersTest, CompleteWhatWaitsAndWhatComesToWait)
+{
+    index(1, 2);
+    StudyWorkers workers(2, kSwift);
+    workers.start();
+    EXPECT_TRUE(comesTrue([this] { return countWaiting() == 0; }));
+    index(2, 3);
+    EXPECT_TRUE(comesTrue([this] { return countWaiting() == 0; }));
+    workers.stop();
+    EXPECT_EQ(workers.completed(), 2);
+    TagFile file;
+    ASSERT_TRUE(file.readCacheFileForStudy("1.2", false));
+    EXPECT_EQ(file.imagesByUID().size(), 3);
+}
+
+TEST_P(StudyWorkersTest, LeaveAloneWhatHasJustArrived)
+{
+    index(1, 1);
+    index(2, 1);
+    ASSERT_TRUE(catalogue()->requestBuild({"1.2"}).good());
+    StudyWorkers::Pace patient = kSwift;
+    patient.arrivals = std::chrono::hours(24);
+    StudyWorkers workers(1, patient);
+    workers.start();
+    EXPECT_TRUE(comesTrue([this] { return countWaiting() == 1; }));
+    workers.stop();
+    EXPECT_EQ(workers.completed(), 1);
+    EXPECT_FALSE(QFile::exists(TagFile::cacheFilePathForStudy("1.1")));
+}
+
+TEST_P(StudyWorkersTest, ShareTheWork)
+{
+    constexpr int kStudies = 20;
+    for (int i = 1; i <= kStudies; ++i)
+        index(i, 1);
+    StudyWorkers one(2, kSwift);
+    StudyWorkers other(2, kSwift);
+    one.start();
+    other.start();
+    EXPECT_TRUE(comesTrue([this] { return countWaiting() == 0; }));
+    one.stop();
+    other.stop();
+    EXPECT_EQ(one.completed() + other.completed(), kStudies);
+}
+
+TEST_P(StudyWorkersTest, TryAgainWhatFailedAndGoOnWithOthers)
+{
+    index(1, 1);
+    const QString path = mStore.filePath("1.1.3.1");
+    ASSERT_TRUE(QFile::rename(path, path + QStringLiteral(".away")));
+    StudyWorkers workers(1, kSwift);
+    workers.start();
+    EXPECT_TRUE(comesTrue([this] { return countWaiting() == 1 && mLog.count("is not built") > 1; }));
+    index(2, 1);
+    EXPECT_TRUE(comesTrue([this] { return countWaiting() == 1; }));
+    ASSERT_TRUE(QFile::rename(path + QStringLiteral(".away"), path));
+    EXPECT_TRUE(comesTrue([this] { return countWaiting() == 0; }));
+}
+
+TEST_P(StudyWorkersTest, GoOnWhenTheDatabaseIsThereAgain)
+{
+    if (QByteArray(GetParam()) == "Sqlite")
+        GTEST_SKIP() << "its file cannot be away for a while";
+    index(1, 1);
+    StudyWorkers workers(2, kSwift);
+    workers.start();
+    EXPECT_TRUE(comesTrue([this] { return countWaiting() == 0; }));
+    stopPostgres();
+    while (mLog.count("Waiting for the database") == 0)
+        QThread::yieldCurrentThread();
+    startPostgres();
+    index(2, 1);
+    EXPECT_TRUE(comesTrue([this] { return countWaiting() == 0; }));
+    EXPECT_TRUE(comesTrue([this] { return countWaiting() == 0 && mLog.count("answers again") == 1; }));
+    EXPECT_EQ(mLog.count("Waiting for the database"), 1) << "once for all of them";
+}
+
+}  // namespace

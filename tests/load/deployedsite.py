@@ -1,0 +1,138 @@
+"""A site as docs/deployment.md describes it, in a folder of its own: PostgreSQL, two servers, two workers, and nginx in front
+of the servers with the very configuration that the page shows."""
+import glob
+import os
+import re
+import shutil
+import signal
+import socket
+import subprocess
+import threading
+
+# Refuses to run as an administrator, and goes with us.
+POSTGRES = """set -- /usr/lib/postgresql/*/bin
+if [ $(id -u) = 0 ]; then chown nobody . && S="--reuid nobody --regid nogroup --clear-groups"; fi
+setpriv --pdeathsig QUIT $S $1/initdb -D data -U kdd -A trust -E UTF8 --no-sync --locale=C.UTF-8 >initdb.log &&
+exec setpriv --pdeathsig QUIT $S $1/postgres -D data -k $PWD -c listen_addresses= -c max_connections=300 -c fsync=off"""
+
+
+def free_port():
+    with socket.socket() as listener:
+        listener.bind(("127.0.0.1", 0))
+        return listener.getsockname()[1]
+
+
+def nginx_block(page):
+    """The block of the page that has servers behind it."""
+    with open(page, encoding="utf-8") as text:
+        blocks = re.findall(r"```nginx\n(.*?)```", text.read(), re.DOTALL)
+    return next(block for block in blocks if "upstream" in block)
+
+
+def replaced(pattern, by, text):
+    text, count = re.subn(pattern, by, text)
+    if count == 0:
+        raise SystemExit(f"The page's configuration has no {pattern}")
+    return text
+
+
+class DeployedSite:
+    def __init__(self, kdd, page, folder):
+        self.kdd, self.folder = kdd, folder
+        self.store = os.path.join(folder, "store")
+        self.ports = [free_port(), free_port()]
+        self.port = free_port()
+        self.certificate = os.path.join(folder, "tls.pem")
+        self.processes = {}
+        self.log = open(os.path.join(folder, "log"), "ab")
+        self.environment = dict(
+            os.environ, KDD_STORE=self.store, KDD_FREE_SPACE="0", KDD_SETTLE_SECONDS="3",
+            KDD_SERVER_PROXIES="127.0.0.1", KDD_DATABASE="postgresql://kdd@/postgres?host=" + self.database_folder())
+        self.start_database()
+        self.run("build")
+        self.start_nginx(page)
+
+    def database_folder(self):
+        return os.path.join(self.folder, "pg")
+
+    def run(self, *arguments, **more):
+        """A command of the tool, which has to succeed."""
+        done = subprocess.run([self.kdd, *arguments], env=dict(self.environment, **more), stdout=subprocess.PIPE,
+                              stderr=subprocess.PIPE, check=False)
+        if done.returncode != 0 and arguments != ("build",):
+            raise SystemExit(f"kdd {' '.join(arguments)} ended with {done.returncode}: {done.stderr.decode()}")
+        return done.stdout
+
+    def start_database(self):
+        folder = self.database_folder()
+        os.makedirs(folder)
+        os.chmod(self.folder, 0o755)
+        server = subprocess.Popen(["sh", "-c", POSTGRES], cwd=folder, stdout=subprocess.PIPE, stderr=subprocess.STDOUT)
+        self.processes["postgres"] = server
+        said = b""
+        while b"ready to accept connections" not in said:
+            line = server.stdout.readline()
+            if not line:
+                raise SystemExit("PostgreSQL did not start: " + said.decode())
+            said += line
+        threading.Thread(target=lambda: [None for _ in server.stdout], daemon=True).start()
+
+    def start_nginx(self, page):
+        subprocess.run(["openssl", "req", "-x509", "-newkey", "rsa:2048", "-nodes", "-days", "2", "-subj", "/CN=localhost",
+                        "-addext", "subjectAltName=DNS:localhost", "-keyout", os.path.join(self.folder, "key.pem"),
+                        "-out", self.certificate], check=True, stderr=subprocess.DEVNULL)
+        block = nginx_block(page)
+        block = replaced(r"listen 443", f"listen 127.0.0.1:{self.port}", block)
+        block = replaced(r"127\.0\.0\.1:8042", f"127.0.0.1:{self.ports[0]}", block)
+        block = replaced(r"127\.0\.0\.1:8044", f"127.0.0.1:{self.ports[1]}", block)
+        block = replaced(r"/etc/kdd/", self.folder + "/", block)
+        block = replaced(r"images\.example\.org", "localhost", block)
+        folders = "".join(f"{name}_temp_path {self.folder}/{name};\n"
+                          for name in ("client_body", "proxy", "fastcgi", "uwsgi", "scgi"))
+        path = os.path.join(self.folder, "nginx.conf")
+        with open(path, "w", encoding="utf-8") as configuration:
+            configuration.write(f"daemon off;\npid {self.folder}/nginx.pid;\nerror_log {self.folder}/nginx.log;\n"
+                                f"events {{ worker_connections 1000; }}\nhttp {{\naccess_log off;\n{folders}{block}}}\n")
+        command = [shutil.which("nginx", path=os.environ.get("PATH", "") + ":/usr/sbin"), "-p", self.folder, "-c", path,
+                   "-e", f"{self.folder}/nginx.log"]
+        subprocess.run([*command, "-t"], check=True, stderr=self.log)
+        self.processes["nginx"] = subprocess.Popen(command, stderr=self.log)
+
+    def start_server(self, number):
+        server = subprocess.Popen(
+            [self.kdd, "serve", "--stow", "--listen", f"127.0.0.1:{self.ports[number]}"], env=self.environment,
+            stdout=subprocess.PIPE, stderr=self.log)
+        if not server.stdout.readline():
+            raise SystemExit(f"Server {number} did not start; see {self.log.name}")
+        self.processes[f"server{number}"] = server
+
+    def start_worker(self, number):
+        self.processes[f"worker{number}"] = subprocess.Popen(
+            [self.kdd, "build", "--forever"], env=self.environment, stdout=self.log, stderr=self.log)
+
+    def start(self, name):
+        kind, number = name[:-1], int(name[-1])
+        (self.start_server if kind == "server" else self.start_worker)(number)
+
+    def end(self, name, how=signal.SIGTERM):
+        """Its exit code."""
+        process = self.processes.pop(name)
+        process.send_signal(how)
+        return process.wait(120)
+
+    def tag_files(self, store=None):
+        """Their bytes, by their place."""
+        root = os.path.join(store or self.store, "meta")
+        files = {}
+        for path in glob.glob(root + "/**/*.tc", recursive=True):
+            with open(path, "rb") as file:
+                files[os.path.relpath(path, root)] = file.read()
+        return files
+
+    def close(self):
+        for name in ("server0", "server1", "worker0", "worker1", "nginx"):
+            if name in self.processes:
+                self.end(name, signal.SIGKILL)
+        if "postgres" in self.processes:
+            self.end("postgres", signal.SIGINT)
+        self.log.close()

@@ -1,0 +1,121 @@
+#include "ServedStore.h"
+
+using namespace Kdd;
+
+namespace
+{
+
+/// What of an archive is brought back from a backup.
+struct Restored
+{
+    const char* name;
+    std::vector<const char*> old;   // what is as it was at the backup
+    std::vector<const char*> gone;  // what there was no backup of
+    const char* images;             // that are shown then
+    const char* corrected;          // the patient of image 3, which was corrected after the backup
+    int exitCode;
+};
+
+class Restore : public ServedStore, public testing::WithParamInterface<Restored>
+{
+protected:
+    void store(const std::vector<int>& images) const
+    {
+        quint16 port = 0;
+        const auto server = serve(port);
+        for (const int number : images) {
+            const QByteArray uid = "1.2.3." + QByteArray::number(number);
+            save(uid.constData(), anImage(uid.constData()).with(DCM_PatientName, "Doe^J"));
+            EXPECT_EQ(send(port, bytes(uid.constData())), 200);
+        }
+        server->terminate();
+        EXPECT_EQ(finish(*server).exitCode, 0);
+        EXPECT_EQ(kdd("build --settle").exitCode, 0);
+    }
+
+    void correct(const char* image) const
+    {
+        putFile(path("job.xml"),
+                "<Job><Timestamp>20240131120000</Timestamp><Login>anna</Login><Substitutions>"
+                "<Tag Group=\"0010\" Element=\"0010\"><Value>Roe^R</Value></Tag>"
+                "</Substitutions></Job>");
+        EXPECT_EQ(kdd("qa --study 1.2 --image", {QString::fromLatin1(image), path("job.xml")}).exitCode, 0);
+    }
+
+    void copy(const char* from, const char* to) const
+    {
+        EXPECT_EQ(QProcess::execute(QStringLiteral("cp"), {QStringLiteral("-a"), path(from), path(to)}), 0);
+    }
+
+    void bringBack(const char* part) const
+    {
+        const QByteArray place = QByteArray("store/") + part;
+        const QByteArray kept = QByteArray("backup/") + part;
+        drop(part);
+        copy(kept.constData(), place.constData());
+    }
+
+    void drop(const char* part) const
+    {
+        const QByteArray place = QByteArray("store/") + part;
+        QDir(path(place.constData())).removeRecursively();
+        QFile::remove(path(place.constData()));
+    }
+
+    /// What the metadata say of each image, by the last component of its UID.
+    QMap<QByteArray, QByteArray> patients() const
+    {
+        QMap<QByteArray, QByteArray> found;
+        for (const QJsonValue& image : QJsonDocument::fromJson(kdd("metadata 1.2").out).array()) {
+            const auto value = [&](const char* key) {
+                return image[QLatin1String(key)][QLatin1String("Value")][0];
+            };
+            found.insert(value("00080018").toString().toLatin1().mid(6),
+                         value("00100010")[QLatin1String("Alphabetic")].toString().toUtf8());
+        }
+        return found;
+    }
+};
+
+const Restored kRestored[] = {
+    {"OldDatabase", {"kdd.sqlite"}, {}, "1 2 3 4 5 6", "Roe^R", 0},
+    {"OldTagFiles", {"meta"}, {}, "1 3 4 5 6", "Roe^R", 0},
+    {"OldDatabaseAndTagFiles", {"kdd.sqlite", "meta"}, {}, "1 2 3 4 5 6", "Doe^J", 0},
+    {"OldObjects", {"objects"}, {}, "1 3 4 5 6", "Roe^R", 1},
+    {"OldTagFilesAndObjects", {"meta", "objects"}, {}, "1 3", "Roe^R", 1},
+    {"NoTagFiles", {}, {"meta"}, "1 3 4 5 6", "Roe^R", 0},
+    {"NoTagFilesAndOldDatabase", {"kdd.sqlite"}, {"meta"}, "1 2 3 4 5 6", "Doe^J", 0},
+    {"NoDatabase", {}, {"kdd.sqlite"}, "1 2 3 4 5 6", "Roe^R", 0},
+    {"Nothing", {}, {}, "1 3 4 5 6", "Roe^R", 0},
+};
+
+INSTANTIATE_TEST_SUITE_P(Parts, Restore, testing::ValuesIn(kRestored),
+                         [](const auto& restored) { return std::string(restored.param.name); });
+
+TEST_P(Restore, OneCommandBringsTogetherWhatIsOfDifferentAges)
+{
+    store({1, 2, 3});
+    correct("1.2.3.1");
+    copy("store", "backup");
+    store({4, 5, 6});
+    correct("1.2.3.3");
+    EXPECT_EQ(kdd("delete 1.2 --image 1.2.3.2").exitCode, 0);
+    for (const char* part : GetParam().old)
+        bringBack(part);
+    for (const char* part : GetParam().gone)
+        drop(part);
+    kdd("index", {path("none")});  // makes a database where there is none
+    const Answer built = kdd("build --restored");
+    EXPECT_EQ(built.exitCode, GetParam().exitCode) << built.err.toStdString();
+    const QMap<QByteArray, QByteArray> shown = patients();
+    EXPECT_EQ(QByteArrayList(shown.keys()).join(' ').toStdString(), GetParam().images)
+        << built.err.toStdString();
+    EXPECT_EQ(shown.value("1").toStdString(), "Roe^R");
+    EXPECT_EQ(shown.value("3").toStdString(), GetParam().corrected);
+    EXPECT_EQ(kdd("verify --all").exitCode, GetParam().exitCode);
+    EXPECT_EQ(kdd("build --restored").exitCode, GetParam().exitCode)
+        << "nothing more comes of doing it again";
+    EXPECT_EQ(patients(), shown);
+}
+
+}  // namespace
