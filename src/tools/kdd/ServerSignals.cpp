@@ -1,0 +1,49 @@
+#include "tools/kdd/ServerSignals.h"
+
+#include <fcntl.h>
+#include <unistd.h>
+
+namespace Kdd
+{
+
+namespace
+{
+
+/// Whether the process would go with a terminal that is closed. nohup has that signal ignored.
+bool belongsToTerminal()
+{
+    struct sigaction action = {};
+    const int terminal = ::open("/dev/tty", O_RDONLY | O_CLOEXEC | O_NOCTTY);
+    if (terminal >= 0)
+        ::close(terminal);
+    return terminal >= 0 && ::sigaction(SIGHUP, nullptr, &action) == 0 && action.sa_handler == SIG_DFL;
+}
+
+}  // namespace
+
+ServerSignals::ServerSignals()
+{
+    sigemptyset(&mSignals);
+    sigaddset(&mSignals, SIGINT);
+    sigaddset(&mSignals, SIGTERM);
+    if (!belongsToTerminal())
+        sigaddset(&mSignals, SIGHUP);
+    ::pthread_sigmask(SIG_BLOCK, &mSignals, &mFormer);
+}
+
+ServerSignals::~ServerSignals()
+{
+    ::pthread_sigmask(SIG_SETMASK, &mFormer, nullptr);
+}
+
+void ServerSignals::awaitEnd(const std::function<void()>& renew) const
+{
+    int signal = SIGHUP;
+    for (::sigwait(&mSignals, &signal); signal == SIGHUP; ::sigwait(&mSignals, &signal))
+        renew();
+    std::signal(SIGINT, SIG_DFL);
+    std::signal(SIGTERM, SIG_DFL);
+    ::pthread_sigmask(SIG_UNBLOCK, &mSignals, nullptr);
+}
+
+}  // namespace Kdd
