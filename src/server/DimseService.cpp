@@ -1,18 +1,29 @@
 #include "server/DimseService.h"
 
 #include "server/dimse/EchoProvider.h"
+#include "server/dimse/FindProvider.h"
+#include "server/dimse/GetProvider.h"
+#include "server/dimse/MoveProvider.h"
 #include "server/dimse/StoreProvider.h"
+
+#include <kddlib/ExResource.h>
 
 namespace Kdd
 {
 namespace
 {
 
-Dimse::Providers makeProviders(ServedArchive& archive, const Dimse::AssociationRules& rules)
+Dimse::Providers makeProviders(ServedArchive& archive, const Dimse::DimseSettings& settings)
 {
+    const Dimse::RetrieveSource source = {archive.database, *archive.studies, *archive.objects};
     Dimse::Providers providers;
     providers.push_back(std::make_shared<Dimse::EchoProvider>());
-    providers.push_back(std::make_shared<Dimse::StoreProvider>(*archive.arrivals, rules.takesUnknownClasses));
+    providers.push_back(
+        std::make_shared<Dimse::StoreProvider>(*archive.arrivals, settings.rules.takesUnknownClasses));
+    providers.push_back(std::make_shared<Dimse::FindProvider>(archive.database, *archive.studies,
+                                                              ExResource::dicomAnswers()));
+    providers.push_back(std::make_shared<Dimse::MoveProvider>(source, settings.tls, settings.patience));
+    providers.push_back(std::make_shared<Dimse::GetProvider>(source));
     return providers;
 }
 
@@ -39,7 +50,7 @@ std::unique_ptr<DimseService> DimseService::make(const Dimse::DimseSettings& set
         result = made->mLog.check();
     if (result.good())
         made->mListener =
-            Dimse::DimseListener::make(settings, makeProviders(archive, settings.rules), made->mLog, result);
+            Dimse::DimseListener::make(settings, makeProviders(archive, settings), made->mLog, result);
     return result.good() ? std::move(made) : nullptr;
 }
 

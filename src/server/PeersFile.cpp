@@ -138,6 +138,7 @@ Dimse::Peer readPeer(Section section)
         if (port < 1 || port > 65535)
             section.fail("port", "is no port");
         made.port = static_cast<quint16>(port);
+        made.isSecure = section.flag("tls", false);
     }
     made.rights = section.rights("rights");
     section.end();
@@ -183,6 +184,11 @@ Result PeersFile::parse(const QByteArray& text, PeersFile& file)
     if (whole.has("audit"))
         made.audit = whole.text("audit");
     whole.end();
+    const bool isCalledSecurely = std::any_of(made.rules.peers.begin(), made.rules.peers.end(),
+                                              [](const Dimse::Peer& peer) { return peer.isSecure; });
+    if (result.good() && isCalledSecurely && (!made.tls || made.tls->caFile.isEmpty()))
+        result = Result::failure(QStringLiteral(
+            "tls.caFile is needed to judge the certificates of peers that are called over TLS"));
     if (result.good() && !made.rules.anyone && made.rules.peers.isEmpty())
         result = Result::failure(QStringLiteral("it lets nobody in: there are anyone and peers"));
     if (result.good())

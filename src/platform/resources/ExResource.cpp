@@ -69,6 +69,7 @@ constexpr Setting kDicomListen = {"KDD_DICOM_LISTEN", "dicom/listen", ""};
 constexpr Setting kDicomTitle = {"KDD_DICOM_TITLE", "dicom/title", "KDD"};
 constexpr Setting kDicomPeers = {"KDD_DICOM_PEERS", "dicom/peers", ""};
 constexpr Setting kDicomAssociations = {"KDD_DICOM_ASSOCIATIONS", "dicom/associations", "64"};
+constexpr Setting kDicomAnswers = {"KDD_DICOM_ANSWERS", "dicom/answers", "10000"};
 constexpr Setting kDicomIdle = {"KDD_DICOM_IDLE", "dicom/idle", "300"};
 
 using Values = QHash<QString, QByteArray>;
@@ -350,6 +351,11 @@ QByteArray ExResource::dicomPeers()
 int ExResource::dicomAssociations()
 {
     return numberOf(kDicomAssociations, 1, 1000);
+}
+
+int ExResource::dicomAnswers()
+{
+    return numberOf(kDicomAnswers, 1, 100000);
 }
 
 int ExResource::dicomIdle()

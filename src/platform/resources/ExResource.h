@@ -165,6 +165,9 @@ public:
     /// At a time, 1 to 1,000. KDD_DICOM_ASSOCIATIONS, dicom/associations, "64".
     static int dicomAssociations();
 
+    /// How many answers one C-FIND gets, 1 to 100,000. KDD_DICOM_ANSWERS, dicom/answers, "10000".
+    static int dicomAnswers();
+
     /// How long one may rest between two messages [s], 1 to 86,400. KDD_DICOM_IDLE, dicom/idle, "300".
     static int dicomIdle();
 };

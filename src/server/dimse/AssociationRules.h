@@ -25,6 +25,7 @@ struct Peer
     QVector<QByteArray> addresses;  ///< numeric, from which it may call; empty: from any
     QByteArray host;                ///< where it is called, a name or an address; empty: it never is
     quint16 port = 0;               ///< likewise
+    bool isSecure = false;          ///< it is called over TLS
     Rights rights;
 };
 
