@@ -4,7 +4,12 @@
 
 #include <dcmtk/dcmdata/dctk.h>
 #include <dcmtk/dcmdata/dcxfer.h>
+#include <dcmtk/dcmnet/dcmlayer.h>
+#include <dcmtk/dcmnet/dcmtrans.h>
 #include <dcmtk/dcmtls/tlslayer.h>
+#include <netinet/in.h>
+#include <netinet/tcp.h>
+#include <sys/socket.h>
 
 #include <algorithm>
 #include <cstring>
@@ -63,6 +68,48 @@ Result failure(const char* what, const OFCondition& condition)
     return Result::failure(
         QStringLiteral("%1: %2").arg(QLatin1String(what), QString::fromLatin1(condition.text())));
 }
+
+/// Of the many small messages none waits for another: neither ours until the last one was acknowledged, nor those of the
+/// other side until we acknowledge their heads.
+class PromptConnection : public DcmTCPConnection
+{
+public:
+    explicit PromptConnection(DcmNativeSocketType socket)
+        : DcmTCPConnection(socket)
+    {
+    }
+
+    ssize_t read(void* to, size_t size) override
+    {
+        set(TCP_QUICKACK);
+        return DcmTCPConnection::read(to, size);
+    }
+
+    OFBool networkDataAvailable(int timeout) override
+    {
+        set(TCP_QUICKACK);
+        return DcmTCPConnection::networkDataAvailable(timeout);
+    }
+
+    void set(int option)
+    {
+        const int yes = 1;
+        ::setsockopt(getSocket(), IPPROTO_TCP, option, &yes, sizeof yes);
+    }
+};
+
+class PromptLayer : public DcmTransportLayer
+{
+public:
+    DcmTransportConnection* createConnection(DcmNativeSocketType socket, OFBool isSecure) override
+    {
+        if (isSecure)
+            return nullptr;
+        auto* const connection = new PromptConnection(socket);
+        connection->set(TCP_NODELAY);
+        return connection;
+    }
+};
 
 std::unique_ptr<DcmTLSTransportLayer> makeTls(const TlsRules& rules, Result& result)
 {
@@ -151,6 +198,8 @@ Result MoveAssociation::request(const Parties& parties, const std::vector<Propos
         if (layer == nullptr)
             return result;
         ASC_setTransportLayer(mNetwork, layer.release(), 1);
+    } else {
+        ASC_setTransportLayer(mNetwork, new PromptLayer, 1);
     }
     T_ASC_Parameters* parameters = nullptr;
     condition = ASC_createAssociationParameters(&parameters, ASC_DEFAULTMAXPDU);
@@ -165,15 +214,16 @@ Result MoveAssociation::request(const Parties& parties, const std::vector<Propos
         ASC_destroyAssociationParameters(&parameters);
         return result;
     }
+    mIsBroken = true;
     condition = ASC_requestAssociation(mNetwork, parameters, &mAssociation);
-    if (condition.bad()) {
-        mIsBroken = true;
-        // The association has the parameters where there is one.
-        if (mAssociation == nullptr)
-            ASC_destroyAssociationParameters(&parameters);
-        return failure("It gives no association", condition);
+    if (condition.good()) {
+        mIsBroken = false;
+        return {};
     }
-    return {};
+    // The association has the parameters where there is one.
+    if (mAssociation == nullptr)
+        ASC_destroyAssociationParameters(&parameters);
+    return failure("It gives no association", condition);
 }
 
 MoveAssociation::~MoveAssociation()

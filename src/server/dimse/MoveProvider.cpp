@@ -4,6 +4,7 @@
 #include "server/dimse/RetrieveRun.h"
 
 #include <dcmtk/dcmdata/dctk.h>
+#include <dcmtk/dcmnet/dcmtrans.h>
 #include <kddlib/LogFile.h>
 
 namespace Kdd::Dimse
@@ -93,8 +94,11 @@ MoveProvider::MoveProvider(const RetrieveSource& source, std::optional<TlsRules>
     , mTls(std::move(tls))
     , mPatience(patience)
 {
-    // DCMTK has it for the whole process; nothing else of it calls anybody.
-    dcmConnectionTimeout.set(static_cast<Sint32>(patience.count()));
+    // DCMTK has these for the whole process; nothing else in it lets DCMTK call anybody.
+    const auto seconds = static_cast<Sint32>(patience.count());
+    dcmConnectionTimeout.set(seconds);
+    dcmSocketSendTimeout.set(seconds);
+    dcmSocketReceiveTimeout.set(seconds);
 }
 
 bool MoveProvider::provides(const QByteArray& sopClass) const
