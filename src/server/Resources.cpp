@@ -48,7 +48,7 @@ std::vector<std::unique_ptr<DicomWeb::Resource>> makeResources(ServedArchive& ar
     resources.push_back(std::make_unique<ThumbnailResource>(archive.studies, archive.objects));
     resources.push_back(std::make_unique<RenderedResource>(archive.studies, archive.objects));
     resources.push_back(std::make_unique<UriResource>(archive.studies, archive.objects));
-    if (archive.arrivals != nullptr)
+    if (archive.arrivals != nullptr && archive.takesByRequest)
         resources.push_back(std::make_unique<StoreResource>(*archive.arrivals, archive.storeLimits));
     return resources;
 }

@@ -23,6 +23,7 @@ struct ServedArchive
     std::shared_ptr<DicomWeb::ObjectShelf> objects = std::make_shared<DicomWeb::ObjectShelf>(32 << 20);
     DicomWeb::ThreadSearch database{Kxg::DatabaseServer()};
     std::unique_ptr<DicomWeb::ArrivalService> arrivals;  ///< null where no objects are taken
+    bool takesByRequest = true;                          ///< and not by associations alone
     DicomWeb::StoreLimits storeLimits;
 };
 

@@ -1,5 +1,6 @@
 #include "server/Server.h"
 
+#include "server/DimseService.h"
 #include "server/RequestLog.h"
 #include "server/Resources.h"
 #include "server/Router.h"
@@ -165,6 +166,7 @@ struct Server::Private
         stopTime = settings.http.stop;
         archive.arrivals = std::move(arrivals);
         archive.storeLimits = settings.store;
+        archive.takesByRequest = settings.takesByRequest;
         archive.studies->setArrivals(archive.arrivals.get());
         router.add(prefix, std::make_unique<DicomWeb::DicomWebService>(prefix.size(),
                                                                        makeResources(archive, metrics)));
@@ -197,6 +199,7 @@ struct Server::Private
     Access::AddressGuard guard;
     Access::AddressGuard statusGuard;
     Http::HttpServer http;
+    std::unique_ptr<DimseService> dimse;
     std::unique_ptr<Http::HttpServer> status;  // the first to go: it asks all the others
 };
 
@@ -223,6 +226,12 @@ std::unique_ptr<Server> Server::make(ServerSettings settings, Result& result)
     auto made = std::make_unique<Private>(settings, std::move(arrivals));
     if (made->trail != nullptr)
         result = made->trail->check();
+    if (result.good() && settings.dimse) {
+        made->dimse = DimseService::make(*settings.dimse, settings.dimseAudit, settings.isDimseDecided,
+                                         made->archive, result);
+        if (made->dimse != nullptr)
+            made->dimse->addTo(made->metrics);
+    }
     if (result.bad())
         return nullptr;
     if (viewer != nullptr)
@@ -242,6 +251,8 @@ Result Server::start()
     Result result = d->http.start();
     if (result.good() && d->status != nullptr)
         result = d->status->start();
+    if (result.good() && d->dimse != nullptr)
+        result = d->dimse->start();
     if (result.bad())
         stop();
     else if (d->archive.arrivals != nullptr)
@@ -258,6 +269,8 @@ Result Server::renewCertificate()
 void Server::stop()
 {
     d->http.stop();
+    if (d->dimse != nullptr)
+        d->dimse->stop();
     if (d->archive.arrivals != nullptr)
         d->archive.arrivals->stop(d->stopTime);
     if (d->status != nullptr)
@@ -272,6 +285,11 @@ QByteArray Server::address() const
 QByteArray Server::statusAddress() const
 {
     return d->status != nullptr ? d->status->address() : QByteArray();
+}
+
+QByteArray Server::dimseAddress() const
+{
+    return d->dimse != nullptr ? d->dimse->address().text() : QByteArray();
 }
 
 }  // namespace Kdd

@@ -3,6 +3,7 @@
 #include "server/access/AccessRules.h"
 #include "server/access/AddressGuard.h"
 #include "server/dicomweb/store/StoreBody.h"
+#include "server/dimse/DimseSettings.h"
 #include "server/http/HttpSettings.h"
 
 #include <QString>
@@ -25,6 +26,11 @@ struct ServerSettings
     QByteArray prefix = "/dicom-web";    ///< of the paths of DICOMweb
     QString viewer;                      ///< folder of a viewer's files, served under /viewer; empty: none
     std::optional<ObjectRules> objects;  ///< that are taken; without it none are
+    bool takesByRequest = true;          ///< objects, where any are taken
+    std::optional<Dimse::DimseSettings> dimse;  ///< without it there are no associations
+    bool isDimseDecided =
+        false;              ///< that somebody decided who may have associations; else only this machine may
+    QByteArray dimseAudit;  ///< as DimseLog has it
     DicomWeb::StoreLimits store;
     std::chrono::milliseconds slow{2000};  ///< requests that take longer are told in the log
 };
@@ -54,6 +60,9 @@ public:
 
     /// Empty when there is no such listener.
     QByteArray statusAddress() const;
+
+    /// "127.0.0.1:11112", empty when there is none: where associations are waited for.
+    QByteArray dimseAddress() const;
 
 private:
     struct Private;

@@ -35,7 +35,8 @@ ARROWS = {
     "server/access": ["server/dicomweb"],
     "server/dicomweb": ["server/http"],
     "server/browser": ["server/dicomweb"],
-    "server": ["server/access", "server/browser"],
+    "server/dimse": ["server/dicomweb"],
+    "server": ["server/access", "server/browser", "server/dimse"],
     "tools/kdd": ["sample", "server", "public headers"],
 }
 
@@ -60,13 +61,15 @@ ROOMS = [
     ("server/access/", "server/access"),
     ("server/browser/", "server/browser"),
     ("server/dicomweb/", "server/dicomweb"),
+    ("server/dimse/", "server/dimse"),
     ("server/http/", "server/http"),
     ("server/", "server"),
     ("tools/kdd/", "tools/kdd"),
 ]
 
 # They see the library as others do, through its installed headers, and are linked with what it exports.
-OUTSIDE = ("server", "server/access", "server/browser", "server/dicomweb", "server/http", "tools/kdd")
+OUTSIDE = ("server", "server/access", "server/browser", "server/dicomweb", "server/dimse", "server/http",
+           "tools/kdd")
 
 INCLUDE = re.compile(r'^\s*#\s*include\s*(?:"([^"]+)"|<(kddlib/[^>]+)>)', re.MULTILINE)
 STRONG = set("TDBRG")

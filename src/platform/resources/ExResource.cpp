@@ -65,6 +65,12 @@ constexpr Setting kServerRequests = {"KDD_SERVER_REQUESTS", "server/requests", "
 constexpr Setting kServerPatience = {"KDD_SERVER_PATIENCE", "server/patience", "30"};
 constexpr Setting kServerStop = {"KDD_SERVER_STOP", "server/stop", "30"};
 constexpr Setting kServerSlow = {"KDD_SERVER_SLOW", "server/slow", "2000"};
+constexpr Setting kDicomListen = {"KDD_DICOM_LISTEN", "dicom/listen", ""};
+constexpr Setting kDicomTitle = {"KDD_DICOM_TITLE", "dicom/title", "KDD"};
+constexpr Setting kDicomPeers = {"KDD_DICOM_PEERS", "dicom/peers", ""};
+constexpr Setting kDicomAssociations = {"KDD_DICOM_ASSOCIATIONS", "dicom/associations", "64"};
+constexpr Setting kDicomAnswers = {"KDD_DICOM_ANSWERS", "dicom/answers", "10000"};
+constexpr Setting kDicomIdle = {"KDD_DICOM_IDLE", "dicom/idle", "300"};
 
 using Values = QHash<QString, QByteArray>;
 
@@ -325,6 +331,36 @@ int ExResource::serverStop()
 int ExResource::serverSlow()
 {
     return numberOf(kServerSlow, 0, std::numeric_limits<int>::max());
+}
+
+QByteArray ExResource::dicomListen()
+{
+    return valueOf(kDicomListen);
+}
+
+QByteArray ExResource::dicomTitle()
+{
+    return valueOf(kDicomTitle);
+}
+
+QByteArray ExResource::dicomPeers()
+{
+    return valueOf(kDicomPeers);
+}
+
+int ExResource::dicomAssociations()
+{
+    return numberOf(kDicomAssociations, 1, 1000);
+}
+
+int ExResource::dicomAnswers()
+{
+    return numberOf(kDicomAnswers, 1, 100000);
+}
+
+int ExResource::dicomIdle()
+{
+    return numberOf(kDicomIdle, 1, 86400);
 }
 
 }  // namespace Kdd

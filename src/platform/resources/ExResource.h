@@ -147,6 +147,29 @@ public:
 
     /// Requests that take longer [ms] are told in the log. KDD_SERVER_SLOW, server/slow, "2000".
     static int serverSlow();
+
+    // DICOM associations, in `kdd serve` and `kdd receive`.
+
+    /// Where they are waited for, ADDRESS:PORT or a port of this machine alone. KDD_DICOM_LISTEN, dicom/listen, empty:
+    /// nowhere.
+    static QByteArray dicomListen();
+
+    /// Application entity titles under which the server is called, separated by commas; "*": any. KDD_DICOM_TITLE,
+    /// dicom/title, "KDD".
+    static QByteArray dicomTitle();
+
+    /// Who may have one, and for what: a peers file, or "none" where everybody may do everything. KDD_DICOM_PEERS,
+    /// dicom/peers, empty: everybody may, and only this machine reaches it.
+    static QByteArray dicomPeers();
+
+    /// At a time, 1 to 1,000. KDD_DICOM_ASSOCIATIONS, dicom/associations, "64".
+    static int dicomAssociations();
+
+    /// How many answers one C-FIND gets, 1 to 100,000. KDD_DICOM_ANSWERS, dicom/answers, "10000".
+    static int dicomAnswers();
+
+    /// How long one may rest between two messages [s], 1 to 86,400. KDD_DICOM_IDLE, dicom/idle, "300".
+    static int dicomIdle();
 };
 
 }  // namespace Kdd

@@ -1,11 +1,8 @@
 #pragma once
 
+#include "server/access/AuditFile.h"
 #include "server/access/RightsTable.h"
 #include "server/http/Exchange.h"
-
-#include <kddlib/Result.h>
-
-#include <atomic>
 
 namespace Kdd::Access
 {
@@ -15,23 +12,20 @@ namespace Kdd::Access
 class AuditTrail : public Http::ExchangeObserver
 {
 public:
-    /// Into a file, which is opened for each line: one that was moved away is followed by a new one. "log": into the log.
-    /// `proxies` are believed when they say for whom they ask.
+    /// Into what AuditFile takes for a place. `proxies` are believed when they say for whom they ask.
     AuditTrail(QByteArray place, RightsTable table, QVector<QByteArray> proxies);
 
     /// Whether it can be written to.
-    Result check() const;
+    Result check() const { return mFile.check(); }
 
     void ended(const Http::Exchange& exchange) override;
 
 private:
-    QByteArray lineOf(const Http::Exchange& exchange) const;
-    Result append(const QByteArray& line) const;
+    QJsonObject lineOf(const Http::Exchange& exchange) const;
 
-    QByteArray mPlace;
+    AuditFile mFile;
     RightsTable mTable;
     QVector<QByteArray> mProxies;
-    std::atomic<bool> mIsBroken{false};
 };
 
 }  // namespace Kdd::Access

@@ -22,6 +22,7 @@ namespace Kdd
     DO(Get)                                                                                                  \
     DO(Put)                                                                                                  \
     DO(Serve)                                                                                                \
+    DO(Receive)                                                                                              \
     DO(Sample)
 
 #define KDD_NAME(NAME) void declare##NAME(CommandSet& commands);

@@ -1,8 +1,8 @@
 #include "server/Server.h"
 #include "tools/kdd/Commands.h"
+#include "tools/kdd/DimseOptions.h"
 #include "tools/kdd/Report.h"
 #include "tools/kdd/ServerSignals.h"
-#include "tools/kdd/Store.h"
 
 #include <QFile>
 
@@ -35,6 +35,7 @@ struct ServeRequest
     QByteArray publicAddress;
     QList<QByteArray> hosts;
     bool stow = false;
+    DimseRequest dimse;
 };
 
 QVector<QByteArray> wordsOf(QByteArray text)
@@ -102,24 +103,6 @@ void readLimits(const ServeRequest& request, Http::HttpSettings& http)
     http.stop = std::chrono::seconds(ExResource::serverStop());
 }
 
-bool readObjectRules(const GlobalOptions& options, ServerSettings& settings)
-{
-    constexpr qint64 kMiB = 1024 * 1024;
-    const QByteArray sameUid = ExResource::sameUid();
-    if (sameUid != "refuse" && sameUid != "replace") {
-        LogFile::errorf("What becomes of objects of the same UID is \"refuse\" or \"replace\", not \"%s\"",
-                        sameUid.constData());
-        return false;
-    }
-    ObjectRules& rules = settings.objects.emplace();
-    rules.folder = objectFolder(options);
-    rules.sameUid = sameUid == "replace" ? SameUid::Replace : SameUid::Refuse;
-    rules.freeBytes = ExResource::freeSpace() * kMiB;
-    rules.objectBytes = ExResource::objectSize() * kMiB;
-    settings.store.requestBytes = ExResource::serverRequestSize() * kMiB;
-    return true;
-}
-
 /// False, with the reason logged, when something is written that is none.
 bool readSettings(const GlobalOptions& options, const ServeRequest& request, ServerSettings& settings)
 {
@@ -136,7 +119,16 @@ bool readSettings(const GlobalOptions& options, const ServeRequest& request, Ser
     settings.addresses.publicAddress = orElse(request.publicAddress, ExResource::serverPublicAddress());
     settings.addresses.hosts = wordsOf(ExResource::serverHosts()) + request.hosts.toVector();
     settings.addresses.proxies = wordsOf(ExResource::serverProxies());
-    return !(request.stow || ExResource::serverTakesObjects()) || readObjectRules(options, settings);
+    settings.takesByRequest = request.stow || ExResource::serverTakesObjects();
+    settings.store.requestBytes = ExResource::serverRequestSize() * qint64(1024 * 1024);
+    DimseOrder order;
+    if (!readDimse(request.dimse, order))
+        return false;
+    settings.dimse = order.settings;
+    settings.isDimseDecided = order.isDecided;
+    settings.dimseAudit = order.audit;
+    return !(settings.takesByRequest || settings.dimse) ||
+           readObjectRules(options, settings.objects.emplace());
 }
 
 void tellAddress(const GlobalOptions& options, const Server& server, bool hasViewer)
@@ -144,13 +136,18 @@ void tellAddress(const GlobalOptions& options, const Server& server, bool hasVie
     const QString address = QString::fromLatin1(server.address());
     const QString status = QString::fromLatin1(server.statusAddress());
     if (options.json) {
-        printJson({{QStringLiteral("address"), address}, {QStringLiteral("status"), status}});
+        QJsonObject told = {{QStringLiteral("address"), address}, {QStringLiteral("status"), status}};
+        if (!server.dimseAddress().isEmpty())
+            told.insert(QStringLiteral("dicom"), QString::fromLatin1(server.dimseAddress()));
+        printJson(told);
     } else {
         std::printf("Serving at %s\n", qUtf8Printable(address));
         if (hasViewer)
             std::printf("Viewer at %s/viewer/\n", qUtf8Printable(address));
         if (!status.isEmpty())
             std::printf("Watched at %s\n", qUtf8Printable(status));
+        if (!server.dimseAddress().isEmpty())
+            std::printf("Associations at %s\n", server.dimseAddress().constData());
     }
     std::fflush(stdout);
 }
@@ -206,7 +203,8 @@ void declareServe(CommandSet& commands)
         "where no other machine reaches it until --access says who may do what. What has no option here is a "
         "setting of the site, as each option is.",
         "kdd serve\n"
-        "kdd serve --viewer viewer --public https://images.example.org"};
+        "kdd serve --viewer viewer --public https://images.example.org\n"
+        "kdd serve --dicom 11112                # and for modalities of this machine"};
     const auto request = std::make_shared<ServeRequest>();
     ArgumentList arguments = commands.declare(
         text, [request](const GlobalOptions& options) { return runServe(options, *request); });
@@ -227,6 +225,7 @@ void declareServe(CommandSet& commands)
     arguments.text({"--public", kUrl, "Address under which clients reach the server"},
                    request->publicAddress);
     arguments.flag("--stow", request->stow, "Take objects that clients send (STOW-RS)");
+    request->dimse.addTo(arguments);
     arguments.texts({"--host", "NAME", "Further name by which the server may be asked; may be repeated"},
                     request->hosts);
 }

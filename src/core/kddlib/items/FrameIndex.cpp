@@ -39,7 +39,8 @@ QVector<qint64> readTable(MediaSource& file, const FileStretch& table, int frame
     if (readAll(file, table, bytes.data()).bad())
         return offsets;
     for (int i = 0; i < frames; ++i)
-        offsets.append(static_cast<qint64>(qFromLittleEndian<Number>(bytes.constData() + i * int(sizeof(Number)))));
+        offsets.append(
+            static_cast<qint64>(qFromLittleEndian<Number>(bytes.constData() + i * int(sizeof(Number)))));
     return offsets;
 }
 
@@ -85,7 +86,8 @@ QByteArray shifted(const QByteArray& bytes, int firstBit, qint64 bits)
     }
     // The bits behind the last pixel belong to the next frame.
     if (bits % 8 != 0)
-        moved[moved.size() - 1] = static_cast<char>(quint8(moved.at(moved.size() - 1)) & ((1U << (bits % 8)) - 1U));
+        moved[moved.size() - 1] =
+            static_cast<char>(quint8(moved.at(moved.size() - 1)) & ((1U << (bits % 8)) - 1U));
     return moved;
 }
 
@@ -146,6 +148,11 @@ const QByteArray& FrameIndex::studyInstanceUID() const
 const QByteArray& FrameIndex::sopInstanceUID() const
 {
     return d->sopInstanceUID;
+}
+
+qint64 FrameIndex::datasetOffset() const
+{
+    return d->dataset;
 }
 
 FileStretch FrameIndex::pixelElement() const

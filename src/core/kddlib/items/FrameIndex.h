@@ -58,6 +58,9 @@ public:
     const QByteArray& studyInstanceUID() const;
     const QByteArray& sopInstanceUID() const;  ///< empty in the few kinds of objects that have none
 
+    /// Where the dataset begins: behind preamble and meta header [bytes].
+    qint64 datasetOffset() const;
+
     /// Of the element with the pixels: from its tag on to where the next element begins. Of length 0 and at the end of
     /// the file when there is none.
     FileStretch pixelElement() const;

@@ -95,12 +95,12 @@ Verdict readReport(const ServedStudy& study, const ListedImage& image, ObjectShe
     InstanceForm form;
     form.syntaxes = {{"*", 1000}};
     std::vector<Http::BodyPart> body;
-    QByteArray syntaxUID;
+    MadeInstance made;
     QByteArray bytes;
     QByteArray block;
-    const Verdict made = makeInstance(study, image, form, objects, body, syntaxUID);
-    if (made.bad())
-        return made;
+    const Verdict verdict = makeInstance(study, image, form, objects, body, made);
+    if (verdict.bad())
+        return verdict;
     BodyBlocks blocks(std::move(body));
     do {
         if (blocks.next(block).bad())

@@ -84,7 +84,7 @@ Verdict checkInstance(const ServedStudy& study, const ListedImage& image, const 
 }
 
 Verdict makeInstance(const ServedStudy& study, const ListedImage& image, const InstanceForm& form,
-                     ObjectShelf& objects, std::vector<Http::BodyPart>& body, QByteArray& syntaxUID)
+                     ObjectShelf& objects, std::vector<Http::BodyPart>& body, MadeInstance& made)
 {
     ImageOrigin origin;
     FoundObject object;
@@ -93,24 +93,26 @@ Verdict makeInstance(const ServedStudy& study, const ListedImage& image, const I
     if (verdict.good())
         verdict = objects.open(origin, object);
     if (verdict.good())
-        verdict = chooseSyntax(object, form, syntaxUID);
+        verdict = chooseSyntax(object, form, made.syntaxUID);
     if (verdict.bad())
         return verdict;
     CorrectedDataset dataset;
-    const Result made = dataset.make(*object.bytes, object.index, *shown, syntaxUID);
-    if (made.bad())
-        return failed(image, made);
+    const Result corrected = dataset.make(*object.bytes, object.index, *shown, made.syntaxUID);
+    if (corrected.bad())
+        return failed(image, corrected);
     if (dataset.isAsInFile()) {
+        made.metaLength = object.index.datasetOffset();
         body.push_back(object.bytes->part({0, object.bytes->size()}));
         return {};
     }
+    made.metaLength = dataset.metaLength();
     body.emplace_back(dataset.head().left(dataset.metaLength()));
     std::vector<Http::BodyPart> rest;
     rest.emplace_back(dataset.head().mid(dataset.metaLength()));
-    verdict = appendPixels(image, object, dataset.pixels(), syntaxUID, rest);
+    verdict = appendPixels(image, object, dataset.pixels(), made.syntaxUID, rest);
     if (!dataset.tail().isEmpty())
         rest.emplace_back(dataset.tail());
-    if (syntaxUID == kDeflatedLittleEndian)
+    if (made.syntaxUID == kDeflatedLittleEndian)
         body.emplace_back(std::make_unique<DeflatedBody>(std::move(rest)));
     else
         std::move(rest.begin(), rest.end(), std::back_inserter(body));

@@ -12,9 +12,16 @@ namespace Kdd::DicomWeb
 Verdict checkInstance(const ServedStudy& study, const ListedImage& image, const InstanceForm& form,
                       ObjectShelf& objects);
 
-/// Makes the image as a DICOM file that shows what the tag file shows. The stored file itself is given where it shows
-/// just that. `syntaxUID` is set to what it is in.
+/// What a DICOM file that was made is.
+struct MadeInstance
+{
+    QByteArray syntaxUID;
+    qint64 metaLength = 0;  ///< of preamble and meta header, with which it begins [bytes]
+};
+
+/// Makes the image as a DICOM file that shows what the tag file shows, and appends it to a body. The stored file itself is
+/// given where it shows just that.
 Verdict makeInstance(const ServedStudy& study, const ListedImage& image, const InstanceForm& form,
-                     ObjectShelf& objects, std::vector<Http::BodyPart>& body, QByteArray& syntaxUID);
+                     ObjectShelf& objects, std::vector<Http::BodyPart>& body, MadeInstance& made);
 
 }  // namespace Kdd::DicomWeb

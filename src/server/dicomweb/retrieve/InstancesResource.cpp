@@ -47,21 +47,22 @@ Verdict keepGivable(const ServedStudy& study, const InstanceForm& form, ObjectSh
     return kept.isEmpty() ? first : Verdict();
 }
 
-Http::Response one(const ServedStudy& study, const ListedImage& image, const InstanceForm& form, ObjectShelf& objects)
+Http::Response one(const ServedStudy& study, const ListedImage& image, const InstanceForm& form,
+                   ObjectShelf& objects)
 {
     Http::Response response;
-    QByteArray syntaxUID;
+    MadeInstance made;
     if (form.packing == InstanceForm::Packing::Single) {
-        const Verdict made = makeInstance(study, image, form, objects, response.body, syntaxUID);
-        response.addHeader("Content-Type", contentType(syntaxUID));
-        return made.good() ? std::move(response) : made.response();
+        const Verdict verdict = makeInstance(study, image, form, objects, response.body, made);
+        response.addHeader("Content-Type", contentType(made.syntaxUID));
+        return verdict.good() ? std::move(response) : verdict.response();
     }
     Http::MultipartWriter packing("application/dicom");
     response.body.emplace_back();
-    const Verdict made = makeInstance(study, image, form, objects, response.body, syntaxUID);
-    if (made.bad())
-        return made.response();
-    response.body.front() = packing.begin({}, contentType(syntaxUID));
+    const Verdict verdict = makeInstance(study, image, form, objects, response.body, made);
+    if (verdict.bad())
+        return verdict.response();
+    response.body.front() = packing.begin({}, contentType(made.syntaxUID));
     response.body.emplace_back(packing.end() + packing.finish());
     response.addHeader("Content-Type", packing.mediaType());
     return response;
@@ -75,22 +76,21 @@ Http::Response several(const std::shared_ptr<const ServedStudy>& study, const QV
     const auto make = [=](int number, std::vector<Entry>& entries) {
         const ListedImage& image = images.at(number);
         Entry entry;
-        QByteArray syntaxUID;
-        const Verdict made = makeInstance(*study, image, form, *objects, entry.body, syntaxUID);
-        entry.mediaType = contentType(syntaxUID);
+        MadeInstance made;
+        const Verdict verdict = makeInstance(*study, image, form, *objects, entry.body, made);
+        entry.mediaType = contentType(made.syntaxUID);
         if (isZip)
             entry.name = nameOf(studyUID, 0) + '/' + nameOf(image.seriesUID, 0) + '/' +
                          nameOf(image.sopUID, number + 1) + ".dcm";
-        if (made.good())
+        if (verdict.good())
             entries.push_back(std::move(entry));
-        return made;
+        return verdict;
     };
     std::unique_ptr<Http::Packing> packing = packingOf(form);
     Http::Response response;
     response.addHeader("Content-Type", packing->mediaType());
     if (isZip)
-        response.addHeader("Content-Disposition",
-                           "attachment; filename=\"" + nameOf(studyUID, 0) + ".zip\"");
+        response.addHeader("Content-Disposition", "attachment; filename=\"" + nameOf(studyUID, 0) + ".zip\"");
     response.body.emplace_back(std::make_unique<EntriesProducer>(images.size(), make, std::move(packing)));
     return response;
 }
@@ -108,8 +108,9 @@ Http::Response InstancesResource::answer(const Http::Request& request, const Res
     QVector<ListedImage> images;
     InstanceForm form;
     if (!chooseInstanceForm(Http::AcceptHeader::of(request), !path.instance.isEmpty(), form))
-        return Http::failure(406, QStringLiteral("Instances can be given as multipart/related of application/dicom, as "
-                                                 "application/zip, and one alone as application/dicom"));
+        return Http::failure(
+            406, QStringLiteral("Instances can be given as multipart/related of application/dicom, as "
+                                "application/zip, and one alone as application/dicom"));
     Verdict verdict = findStudy(*mStudies, path, study);
     if (verdict.good())
         verdict = listImages(*study, path, images);
@@ -126,7 +127,8 @@ Http::Response InstancesResource::answer(const Http::Request& request, const Res
     if (images.size() < all) {
         response.status = 206;
         response.addHeader("Warning", "299 kdd \"" + QByteArray::number(all - images.size()) + " of " +
-                                          QByteArray::number(all) + " instances cannot be given in this form\"");
+                                          QByteArray::number(all) +
+                                          " instances cannot be given in this form\"");
     }
     return response;
 }

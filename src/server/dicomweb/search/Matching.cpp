@@ -296,14 +296,14 @@ const SearchCondition* findOwn(const Conditions& conditions, const DcmTagKey& ke
     return found == conditions.end() ? nullptr : *found;
 }
 
-bool holdsMoment(const SearchCondition* date, const SearchCondition* time, const Moment& moment)
+bool holdsMoment(const SearchCondition* date, const SearchCondition* time, const Moment& moment, bool joins)
 {
     ValueRange dates;
     ValueRange times;
     if ((date != nullptr && !parseRange(EVR_DA, date->list.front(), dates)) ||
         (time != nullptr && !parseRange(EVR_TM, time->list.front(), times)))
         return false;
-    if (date != nullptr && time != nullptr && dates.isRange && times.isRange)
+    if (joins && date != nullptr && time != nullptr && dates.isRange && times.isRange)
         return isIn(moment, dates, times);
     return (date == nullptr || isWithin(moment.date, dates)) &&
            (time == nullptr || isWithin(moment.time, times));
@@ -371,7 +371,7 @@ bool timeOfDate(const DcmTagKey& date, DcmTagKey& time)
     return false;
 }
 
-bool holdAll(const Conditions& conditions, const AttributeSource& source, std::optional<int> zone)
+bool holdAll(const Conditions& conditions, const AttributeSource& source, const SearchRequest& request)
 {
     Conditions single = conditions;
     for (const auto& moment : kMoments) {
@@ -379,7 +379,8 @@ bool holdAll(const Conditions& conditions, const AttributeSource& source, std::o
         const SearchCondition* time = findOwn(conditions, moment.second);
         if (date == nullptr && time == nullptr)
             continue;
-        if (!holdsMoment(date, time, momentIn(source, moment.first, moment.second, zone)))
+        if (!holdsMoment(date, time, momentIn(source, moment.first, moment.second, request.zone),
+                         request.joinsMoments))
             return false;
         single.erase(
             std::remove_if(single.begin(), single.end(),
@@ -387,7 +388,7 @@ bool holdAll(const Conditions& conditions, const AttributeSource& source, std::o
             single.end());
     }
     return std::all_of(single.begin(), single.end(), [&](const SearchCondition* each) {
-        return holds(*each, source.values(each->path), zone);
+        return holds(*each, source.values(each->path), request.zone);
     });
 }
 

@@ -8,9 +8,9 @@ namespace Kdd::DicomWeb
 
 using Conditions = std::vector<const SearchCondition*>;
 
-/// Whether all hold. A range of dates and one of times that belong together are one range of moments. With `zone`
-/// [minutes east of UTC] dates and times that the source has in another zone are moved into that one.
-bool holdAll(const Conditions& conditions, const AttributeSource& source, std::optional<int> zone);
+/// Whether all hold, as the request says that dates and times are meant: together or each for itself, and in its zone
+/// if it names one.
+bool holdAll(const Conditions& conditions, const AttributeSource& source, const SearchRequest& request);
 
 /// Whether the condition lets everything pass, as "*" does.
 bool isUniversal(const SearchCondition& condition);

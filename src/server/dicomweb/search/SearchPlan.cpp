@@ -259,7 +259,8 @@ private:
             return false;
         }
         DcmTagKey time;
-        if (!dates.isRange || !timeOfDate(condition.key(), time) || !isRange(findOther(time), EVR_TM, times))
+        if (!mRequest.joinsMoments || !dates.isRange || !timeOfDate(condition.key(), time) ||
+            !isRange(findOther(time), EVR_TM, times))
             return true;
         if (condition.key() != DCM_StudyDate)
             return false;
@@ -280,7 +281,7 @@ private:
             return false;
         parseRange(EVR_TM, condition.list.front(), times);
         // Together with a range of dates it is the ends of a range of moments.
-        if (times.isRange && isRange(findOther(date), EVR_DA, dates))
+        if (mRequest.joinsMoments && times.isRange && isRange(findOther(date), EVR_DA, dates))
             return condition.key() == DCM_StudyTime;
         term.from = times.from;
         term.to = times.to;

@@ -82,6 +82,33 @@ bool parseNumber(const QByteArray& text, int greatest, int& number)
     return true;
 }
 
+bool parseZone(const QByteArray& value, std::optional<int>& zone, QString& reason)
+{
+    zone = zoneMinutes(value);
+    if (!zone)
+        reason = QStringLiteral("%1 is no offset from UTC").arg(quoted(value));
+    return zone.has_value();
+}
+
+/// Those of a list, each once; else the value itself.
+QVector<QString> valuesOf(const SearchCondition& condition, bool hasLists)
+{
+    const bool isUID = condition.vr == EVR_UI;
+    const bool isModality = condition.key() == DCM_ModalitiesInStudy || condition.key() == DCM_Modality;
+    QString text = condition.value;
+    if (isUID || isModality)
+        text.replace(QLatin1Char(','), QLatin1Char('\\'));
+    if (!isUID && !isModality && !hasLists)
+        return {text};
+    QVector<QString> values;
+    for (const QString& each : text.split(QLatin1Char('\\'))) {
+        const QString value = each.trimmed();
+        if (!value.isEmpty() && !values.contains(value))
+            values.append(value);
+    }
+    return values;
+}
+
 /// The dictionary's VR, where the dictionary leaves a choice the one that is searched.
 DcmEVR vrOf(const DcmTagKey& key)
 {
@@ -125,9 +152,9 @@ private:
         if (field.name == "fuzzymatching")
             truth = &mRequest.isFuzzy;
         else if (field.name == "emptyvaluematching")
-            truth = &mFindsEmpty;
+            truth = &mForm.findsEmpty;
         else if (field.name == "multiplevaluematching")
-            truth = &mHasLists;
+            truth = &mForm.hasLists;
         if (truth == nullptr || parseTruth(field.value, *truth))
             return true;
         return fail(QStringLiteral("%1 is \"true\" or \"false\"").arg(QString::fromLatin1(field.name)));
@@ -201,10 +228,7 @@ private:
 
     bool takeZone(const QByteArray& value)
     {
-        if (value.isEmpty())
-            return true;
-        mRequest.zone = zoneMinutes(value);
-        return mRequest.zone || fail(QStringLiteral("%1 is no offset from UTC").arg(quoted(value)));
+        return value.isEmpty() || parseZone(value, mRequest.zone, mReason);
     }
 
     bool takeCondition(const Http::Field& field)
@@ -216,53 +240,14 @@ private:
                 return fail(QStringLiteral("There is no attribute or parameter %1").arg(quoted(field.name)));
             condition.path.append(key);
         }
-        // The classes in a study are those of its images.
-        if (condition.key() == DCM_SOPClassesInStudy)
-            condition.path = {DCM_SOPClassUID};
-        // It says how others are to be read, and nothing matches it itself.
-        if (condition.key() == DCM_TimezoneOffsetFromUTC && !condition.isInItems())
-            return takeZone(field.value);
-        if (condition.key() == DCM_SpecificCharacterSet || field.value.isEmpty())
-            return true;
-        if (condition.vr == EVR_SQ)
-            return fail(
-                QStringLiteral("%1 is a sequence: name an attribute of its items").arg(quoted(field.name)));
         condition.value = QString::fromUtf8(field.value);
-        condition.isEmpty = mFindsEmpty && condition.value == QLatin1String("\"\"");
-        takeList(condition);
-        if (condition.list.size() > kMaxValues)
-            return fail(QStringLiteral("%1 has too many values").arg(quoted(field.name)));
-        if (condition.list.isEmpty())
-            return true;
-        if (mRequest.conditions.size() >= kMaxConditions)
-            return fail(QStringLiteral("Too many attributes are asked for"));
-        mRequest.conditions.push_back(condition);
-        return true;
-    }
-
-    void takeList(SearchCondition& condition) const
-    {
-        const bool isUID = condition.vr == EVR_UI;
-        const bool isModality = condition.key() == DCM_ModalitiesInStudy || condition.key() == DCM_Modality;
-        QString text = condition.value;
-        if (isUID || isModality)
-            text.replace(QLatin1Char(','), QLatin1Char('\\'));
-        if (!isUID && !isModality && !mHasLists) {
-            condition.list.append(text);
-            return;
-        }
-        for (const QString& each : text.split(QLatin1Char('\\'))) {
-            const QString value = each.trimmed();
-            if (!value.isEmpty() && !condition.list.contains(value))
-                condition.list.append(value);
-        }
+        return mRequest.require(condition, mForm, mReason);
     }
 
     SearchRequest& mRequest;
     QString& mReason;
     int mGreatest = kGreatestLimit;
-    bool mFindsEmpty = false;
-    bool mHasLists = false;
+    ValueForm mForm;
 };
 
 /// The dictionary is walked from its beginning for each keyword; few are ever asked for, and no more than it has.
@@ -347,6 +332,36 @@ bool SearchRequest::takePath(const ResourcePath& path, SearchRequest& request)
 bool SearchRequest::parse(const QVector<Http::Field>& query, SearchRequest& request, QString& reason)
 {
     return Parser(request, reason).run(query);
+}
+
+bool SearchRequest::require(SearchCondition condition, const ValueForm& form, QString& reason)
+{
+    const QString name = QString::fromLatin1(DcmTag(condition.key()).getTagName());
+    // The classes in a study are those of its images.
+    if (condition.key() == DCM_SOPClassesInStudy)
+        condition.path = {DCM_SOPClassUID};
+    if (condition.value.isEmpty() || condition.key() == DCM_SpecificCharacterSet)
+        return true;
+    // It says how others are to be read, and nothing matches it itself.
+    if (condition.key() == DCM_TimezoneOffsetFromUTC && !condition.isInItems())
+        return parseZone(condition.value.toUtf8(), zone, reason);
+    if (condition.vr == EVR_SQ) {
+        reason = QStringLiteral("%1 is a sequence: name an attribute of its items").arg(name);
+        return false;
+    }
+    condition.isEmpty = form.findsEmpty && condition.value == QLatin1String("\"\"");
+    condition.list = valuesOf(condition, form.hasLists);
+    if (condition.list.size() > kMaxValues) {
+        reason = QStringLiteral("%1 has too many values").arg(name);
+        return false;
+    }
+    if (!condition.list.isEmpty() && conditions.size() >= kMaxConditions) {
+        reason = QStringLiteral("Too many attributes are asked for");
+        return false;
+    }
+    if (!condition.list.isEmpty())
+        conditions.push_back(condition);
+    return true;
 }
 
 }  // namespace Kdd::DicomWeb

@@ -36,6 +36,13 @@ struct SearchCondition
     bool isInItems() const { return path.size() > 1; }
 };
 
+/// How a protocol writes values of which any is wanted, and none at all.
+struct ValueForm
+{
+    bool hasLists = false;    ///< "\\" separates values of every attribute, not of UIDs and modalities alone
+    bool findsEmpty = false;  ///< two quotes ask for what has no value
+};
+
 /// A search as it was asked for, with everything understood and bounded.
 ///
 /// An attribute is named by its keyword or its eight hexadecimal digits, one in the items of sequences by these joined by
@@ -58,12 +65,19 @@ struct SearchRequest
     /// Dates and times are meant in this zone [minutes east of UTC]; else as they are written.
     std::optional<int> zone;
 
+    /// A range of dates and one of the times that belong to them ask for one range of moments; else each for itself.
+    bool joinsMoments = true;
+
     /// Whether the path is that of a search; then also the level and the UIDs of it.
     static bool takePath(const ResourcePath& path, SearchRequest& request);
 
     /// Takes the parameters. False, with one line for the client, when one cannot be understood: a name that is
     /// misspelt must not find everything.
     static bool parse(const QVector<Http::Field>& query, SearchRequest& request, QString& reason);
+
+    /// Takes a condition of which path, VR and value are set; what asks for nothing is passed over. False, with one line
+    /// for the client, when it cannot be understood or is one too many.
+    bool require(SearchCondition condition, const ValueForm& form, QString& reason);
 };
 
 /// The attribute that a client names; false when there is none of that name.

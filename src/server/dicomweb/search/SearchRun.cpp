@@ -70,6 +70,12 @@ Result findCurrent(Kxg::StudySearch& search, std::vector<Found>& found, const As
     return result;
 }
 
+/// What all studies of a patient have alike.
+bool isOfPatient(const SearchCondition* condition)
+{
+    return condition->path.front().getGroup() == DCM_PatientID.getGroup();
+}
+
 int instanceNumber(const TagMap& image)
 {
     int number = 0;
@@ -150,20 +156,20 @@ bool SearchRun::holdsImage(const QByteArray& studyUID, const QByteArray& seriesU
         const auto& images = file.imagesByUID();
         return std::any_of(images.begin(), images.end(), [&](const TagMap* image) {
             return (seriesUID.isEmpty() || image->uid(TagMap::SeriesLevel) == seriesUID) &&
-                   holdAll(mPlan.onImages, ImageAttributes(*image), mRequest.zone);
+                   holdAll(mPlan.onImages, ImageAttributes(*image), mRequest);
         });
     });
 }
 
 bool SearchRun::holds(const Kxg::FoundStudy& study) const
 {
-    return holdAll(mPlan.onStudy, KeptAttributes(study.attributes), mRequest.zone);
+    return holdAll(mPlan.onStudy, KeptAttributes(study.attributes), mRequest);
 }
 
 bool SearchRun::holds(const Kxg::FoundSeries& series) const
 {
-    return holdAll(mPlan.onStudy, KeptAttributes(series.study.attributes), mRequest.zone) &&
-           holdAll(mPlan.onSeries, KeptAttributes(series.attributes), mRequest.zone);
+    return holdAll(mPlan.onStudy, KeptAttributes(series.study.attributes), mRequest) &&
+           holdAll(mPlan.onSeries, KeptAttributes(series.attributes), mRequest);
 }
 
 // ---- studies, series, patients
@@ -235,11 +241,15 @@ Result SearchRun::runSeries(FoundAnswers& answers)
 
 Result SearchRun::runPatients(FoundAnswers& answers)
 {
-    Kxg::SearchQuery query = mPlan.query;
-    if (!mPlan.isExact()) {
+    const bool isOfPatients = mPlan.onSeries.empty() && mPlan.onImages.empty() &&
+                              std::all_of(mPlan.onStudy.begin(), mPlan.onStudy.end(), isOfPatient);
+    if (!isOfPatients) {
         mTooBroad = QStringLiteral("Patients are found by what is indexed of their studies only");
         return {};
     }
+    if (!mPlan.isExact())
+        return lookThroughPatients(answers);
+    Kxg::SearchQuery query = mPlan.query;
     std::vector<Kxg::FoundPatient> found;
     query.offset = mRequest.offset;
     query.limit = mRequest.limit + 1;
@@ -250,6 +260,34 @@ Result SearchRun::runPatients(FoundAnswers& answers)
     // Nobody has counted them; there is one more at least.
     mRemaining = static_cast<int>(found.size()) - shown;
     mIsRemainingCut = mRemaining > 0;
+    return result;
+}
+
+/// Those of the index may be more than are meant.
+Result SearchRun::lookThroughPatients(FoundAnswers& answers)
+{
+    Kxg::SearchQuery query = mPlan.query;
+    std::vector<Kxg::FoundPatient> found;
+    query.limit = kRowsAtOnce;
+    int matched = 0;
+    Result result = mSearch.patients(query, found);
+    while (result.good() && !found.empty()) {
+        for (const Kxg::FoundPatient& patient : found) {
+            if (!holdAll(mPlan.onStudy, KeptAttributes(patient.attributes), mRequest))
+                continue;
+            if (matched++ >= mRequest.offset && answers.count() < mRequest.limit)
+                answers.add(patient);
+        }
+        query.offset += kRowsAtOnce;
+        if (query.offset >= kMaxRows) {
+            mTooBroad =
+                QStringLiteral("More than %1 patients would have to be looked through: narrow the search")
+                    .arg(kMaxRows);
+            return result;
+        }
+        result = mSearch.patients(query, found);
+    }
+    noteRemaining(matched - mRequest.offset - answers.count(), kMaxRemaining);
     return result;
 }
 
@@ -267,7 +305,7 @@ int SearchRun::addImages(const Kxg::FoundSeries& series, int skipped, int wanted
         if (held == nullptr)
             return 0;
         for (const TagMap* image : imagesOf(*held)) {
-            if (!holdAll(mPlan.onImages, ImageAttributes(*image), mRequest.zone))
+            if (!holdAll(mPlan.onImages, ImageAttributes(*image), mRequest))
                 continue;
             if (matched++ >= skipped && wanted-- > 0)
                 answers.add(series, *image);

@@ -45,6 +45,7 @@ private:
     Result runStudies(FoundAnswers& answers);
     Result runSeries(FoundAnswers& answers);
     Result runPatients(FoundAnswers& answers);
+    Result lookThroughPatients(FoundAnswers& answers);
     Result runImages(FoundAnswers& answers);
 
     Result findStudies(const Kxg::SearchQuery& query, std::vector<Kxg::FoundStudy>& found, int* behind);

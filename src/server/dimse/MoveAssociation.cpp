@@ -1,0 +1,266 @@
+#include "server/dimse/MoveAssociation.h"
+
+#include "server/dicomweb/MediaTypes.h"
+
+#include <dcmtk/dcmdata/dctk.h>
+#include <dcmtk/dcmdata/dcxfer.h>
+#include <dcmtk/dcmnet/dcmlayer.h>
+#include <dcmtk/dcmnet/dcmtrans.h>
+#include <dcmtk/dcmtls/tlslayer.h>
+#include <netinet/in.h>
+#include <netinet/tcp.h>
+#include <sys/socket.h>
+
+#include <algorithm>
+#include <cstring>
+
+namespace Kdd::Dimse
+{
+namespace
+{
+
+using namespace DicomWeb;
+
+/// Contexts have odd numbers of one byte.
+constexpr std::size_t kMostContexts = 128;
+
+/// Of a name by which a host is called, as DCMTK has room for it together with the port [bytes].
+constexpr int kLongestHost = 100;
+
+const QVector<QByteArray> kPlain = {kExplicitLittleEndian, kImplicitLittleEndian};
+
+bool isCompressed(const QByteArray& syntax)
+{
+    return DcmXfer(syntax.constData()).isEncapsulated();
+}
+
+/// In which a file may be whose syntax the tag file could not tell, because DCMTK has no number for it.
+const QVector<QByteArray>& unnumberedSyntaxes()
+{
+    static const QVector<QByteArray> syntaxes = [] {
+        QVector<QByteArray> made;
+        for (const SyntaxMedia& row : syntaxMedia()) {
+            if (DcmXfer(row.uid).getXfer() == EXS_Unknown)
+                made.append(row.uid);
+        }
+        return made;
+    }();
+    return syntaxes;
+}
+
+QVector<QByteArray> compressedSyntaxesOf(const RetrieveItem& item)
+{
+    if (item.storedSyntax.isEmpty())
+        return unnumberedSyntaxes();
+    return isCompressed(item.storedSyntax) ? QVector<QByteArray>{item.storedSyntax} : QVector<QByteArray>();
+}
+
+bool holds(const std::vector<ProposedContext>& proposals, const QByteArray& sopClass,
+           const QVector<QByteArray>& syntaxes)
+{
+    return std::any_of(proposals.begin(), proposals.end(), [&](const ProposedContext& each) {
+        return each.sopClass == sopClass && each.syntaxes == syntaxes;
+    });
+}
+
+Result failure(const char* what, const OFCondition& condition)
+{
+    return Result::failure(
+        QStringLiteral("%1: %2").arg(QLatin1String(what), QString::fromLatin1(condition.text())));
+}
+
+/// Of the many small messages none waits for another: neither ours until the last one was acknowledged, nor those of the
+/// other side until we acknowledge their heads.
+class PromptConnection : public DcmTCPConnection
+{
+public:
+    explicit PromptConnection(DcmNativeSocketType socket)
+        : DcmTCPConnection(socket)
+    {
+    }
+
+    ssize_t read(void* to, size_t size) override
+    {
+        set(TCP_QUICKACK);
+        return DcmTCPConnection::read(to, size);
+    }
+
+    OFBool networkDataAvailable(int timeout) override
+    {
+        set(TCP_QUICKACK);
+        return DcmTCPConnection::networkDataAvailable(timeout);
+    }
+
+    void set(int option)
+    {
+        const int yes = 1;
+        ::setsockopt(getSocket(), IPPROTO_TCP, option, &yes, sizeof yes);
+    }
+};
+
+class PromptLayer : public DcmTransportLayer
+{
+public:
+    DcmTransportConnection* createConnection(DcmNativeSocketType socket, OFBool isSecure) override
+    {
+        if (isSecure)
+            return nullptr;
+        auto* const connection = new PromptConnection(socket);
+        connection->set(TCP_NODELAY);
+        return connection;
+    }
+};
+
+std::unique_ptr<DcmTLSTransportLayer> makeTls(const TlsRules& rules, Result& result)
+{
+    auto layer = std::make_unique<DcmTLSTransportLayer>(NET_REQUESTOR, nullptr, OFFalse);
+    OFCondition condition = layer->setTLSProfile(TSP_Profile_BCP195_ND);
+    if (condition.good())
+        condition = layer->activateCipherSuites();
+    if (condition.good())
+        condition = layer->setPrivateKeyFile(rules.keyFile.constData(), DCF_Filetype_PEM);
+    if (condition.good())
+        condition = layer->setCertificateFile(rules.certificateFile.constData(), DCF_Filetype_PEM);
+    if (condition.good())
+        condition = layer->addTrustedCertificateFile(rules.caFile.constData(), DCF_Filetype_PEM);
+    layer->setCertificateVerification(DCV_requireCertificate);
+    if (condition.bad())
+        result = failure("TLS cannot be spoken", condition);
+    return condition.good() ? std::move(layer) : nullptr;
+}
+
+Result addContexts(T_ASC_Parameters& parameters, const std::vector<ProposedContext>& proposals)
+{
+    int id = 1;
+    for (const ProposedContext& each : proposals) {
+        std::vector<const char*> syntaxes;
+        for (const QByteArray& syntax : each.syntaxes)
+            syntaxes.push_back(syntax.constData());
+        const OFCondition added = ASC_addPresentationContext(
+            &parameters, static_cast<T_ASC_PresentationContextID>(id), each.sopClass.constData(),
+            syntaxes.data(), static_cast<int>(syntaxes.size()));
+        if (added.bad())
+            return failure("A class cannot be proposed", added);
+        id += 2;
+    }
+    return {};
+}
+
+}  // namespace
+
+std::vector<ProposedContext> proposalsFor(const std::vector<RetrieveItem>& items, std::size_t index)
+{
+    std::vector<ProposedContext> proposals;
+    for (; index < items.size(); ++index) {
+        const RetrieveItem& item = items[index];
+        std::vector<ProposedContext> more;
+        if (!holds(proposals, item.sopClass, kPlain))
+            more.push_back({item.sopClass, kPlain});
+        for (const QByteArray& syntax : compressedSyntaxesOf(item)) {
+            if (!holds(proposals, item.sopClass, {syntax}))
+                more.push_back({item.sopClass, {syntax}});
+        }
+        if (proposals.size() + more.size() > kMostContexts)
+            break;
+        proposals.insert(proposals.end(), more.begin(), more.end());
+    }
+    return proposals;
+}
+
+bool isProposed(const std::vector<ProposedContext>& proposals, const RetrieveItem& item)
+{
+    const QVector<QByteArray> syntaxes = compressedSyntaxesOf(item);
+    return holds(proposals, item.sopClass, kPlain) &&
+           std::all_of(syntaxes.begin(), syntaxes.end(),
+                       [&](const QByteArray& syntax) { return holds(proposals, item.sopClass, {syntax}); });
+}
+
+std::unique_ptr<MoveAssociation>
+MoveAssociation::open(const Parties& parties, const std::vector<ProposedContext>& proposals, Result& result)
+{
+    std::unique_ptr<MoveAssociation> made(new MoveAssociation);
+    made->mPatience = parties.patience;
+    result = made->request(parties, proposals);
+    return result.good() ? std::move(made) : nullptr;
+}
+
+Result MoveAssociation::request(const Parties& parties, const std::vector<ProposedContext>& proposals)
+{
+    Result result;
+    if (parties.peer.host.size() > kLongestHost)
+        return Result::failure(QStringLiteral("The name of its host is too long"));
+    const auto seconds = static_cast<int>(mPatience.count());
+    OFCondition condition = ASC_initializeNetwork(NET_REQUESTOR, 0, seconds, &mNetwork);
+    if (condition.bad())
+        return failure("DCMTK cannot be made ready", condition);
+    if (parties.tls) {
+        std::unique_ptr<DcmTLSTransportLayer> layer = makeTls(*parties.tls, result);
+        if (layer == nullptr)
+            return result;
+        ASC_setTransportLayer(mNetwork, layer.release(), 1);
+    } else {
+        ASC_setTransportLayer(mNetwork, new PromptLayer, 1);
+    }
+    T_ASC_Parameters* parameters = nullptr;
+    condition = ASC_createAssociationParameters(&parameters, ASC_DEFAULTMAXPDU);
+    if (condition.bad())
+        return failure("DCMTK cannot be made ready", condition);
+    const QByteArray address = parties.peer.host + ':' + QByteArray::number(parties.peer.port);
+    ASC_setAPTitles(parameters, parties.ownTitle.constData(), parties.title.constData(), nullptr);
+    ASC_setPresentationAddresses(parameters, "localhost", address.constData());
+    ASC_setTransportLayerType(parameters, parties.tls ? OFTrue : OFFalse);
+    result = addContexts(*parameters, proposals);
+    if (result.bad()) {
+        ASC_destroyAssociationParameters(&parameters);
+        return result;
+    }
+    mIsBroken = true;
+    condition = ASC_requestAssociation(mNetwork, parameters, &mAssociation);
+    if (condition.good()) {
+        mIsBroken = false;
+        return {};
+    }
+    // The association has the parameters where there is one.
+    if (mAssociation == nullptr)
+        ASC_destroyAssociationParameters(&parameters);
+    return failure("It gives no association", condition);
+}
+
+MoveAssociation::~MoveAssociation()
+{
+    if (mAssociation != nullptr) {
+        if (!mIsBroken)
+            mIsBroken = ASC_releaseAssociation(mAssociation).bad();
+        if (mIsBroken)
+            ASC_abortAssociation(mAssociation);
+        ASC_destroyAssociation(&mAssociation);
+    }
+    if (mNetwork != nullptr)
+        ASC_dropNetwork(&mNetwork);
+}
+
+std::vector<SendContext> MoveAssociation::contexts() const
+{
+    std::vector<SendContext> contexts;
+    const int count = ASC_countPresentationContexts(mAssociation->params);
+    for (int i = 0; i < count; ++i) {
+        T_ASC_PresentationContext each = {};
+        if (ASC_getPresentationContext(mAssociation->params, i, &each).good() &&
+            each.resultReason == ASC_P_ACCEPTANCE)
+            contexts.push_back(
+                {each.presentationContextID, each.abstractSyntax, each.acceptedTransferSyntax});
+    }
+    return contexts;
+}
+
+bool MoveAssociation::receive(T_DIMSE_Message& message)
+{
+    T_ASC_PresentationContextID id = 0;
+    DcmDataset* detail = nullptr;
+    const OFCondition came = DIMSE_receiveCommand(
+        mAssociation, DIMSE_NONBLOCKING, static_cast<int>(mPatience.count()), &id, &message, &detail);
+    delete detail;
+    return came.good();
+}
+
+}  // namespace Kdd::Dimse

@@ -1,0 +1,237 @@
+#include "server/dimse/PeerConnection.h"
+
+#include <QtEndian>
+
+#include <netinet/in.h>
+#include <netinet/tcp.h>
+#include <poll.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstring>
+
+namespace Kdd::Dimse
+{
+namespace
+{
+
+constexpr int kHead = 6;  // of a PDU
+constexpr unsigned char kRequest = 1;
+
+/// Of a request for an association [bytes]; the largest that makes sense, with all classes in all forms, takes a tenth.
+constexpr quint32 kLongestRequest = 512 * 1024;
+
+/// Less than this for the length of a message is no sender but somebody who holds a place [bytes/s].
+constexpr qint64 kLeastRate = 1024;
+
+// Who ends an association, and why.
+constexpr unsigned char kByProvider = 2;
+constexpr unsigned char kUnknownPdu = 1;
+constexpr unsigned char kInvalidValue = 6;
+
+int millisecondsTo(PeerConnection::Clock::time_point end)
+{
+    const auto left =
+        std::chrono::ceil<std::chrono::milliseconds>(end - PeerConnection::Clock::now()).count();
+    return static_cast<int>(std::clamp<qint64>(left, 0, 3'600'000));
+}
+
+}  // namespace
+
+PeerConnection::PeerConnection(int socket, std::unique_ptr<Http::Transport> transport, int stop,
+                               std::chrono::seconds patience, const PduLimits& limits)
+    : DcmTransportConnection(socket)
+    , mSocket(socket)
+    , mStop(stop)
+    , mPatience(patience)
+    , mTransport(std::move(transport))
+    , mGuard(limits)
+{
+}
+
+PeerConnection::~PeerConnection()
+{
+    close();
+    ::close(mSocket);
+}
+
+PeerConnection::Clock::time_point PeerConnection::end() const
+{
+    return mBegun + mPatience + std::chrono::seconds(mBytes / kLeastRate);
+}
+
+void PeerConnection::beginMessage()
+{
+    mBegun = Clock::now();
+    mBytes = 0;
+}
+
+bool PeerConnection::wait(short events, Clock::time_point end) const
+{
+    // Many senders write the head of a message by itself, and the rest when that was acknowledged: what would wait for an
+    // answer to go with costs 40 ms for each message. It has to be said again each time.
+    const int yes = 1;
+    if (events == POLLIN)
+        ::setsockopt(mSocket, IPPROTO_TCP, TCP_QUICKACK, &yes, sizeof yes);
+    pollfd socket = {mSocket, events, 0};
+    int ready = -1;
+    do {
+        ready = ::poll(&socket, 1, millisecondsTo(end));
+    } while (ready < 0 && errno == EINTR);
+    return ready > 0 && !mIsBroken;
+}
+
+PeerConnection::Came PeerConnection::await(std::chrono::seconds time)
+{
+    if (mTransport->hasUnread())
+        return Came::Something;
+    pollfd both[] = {{mSocket, POLLIN, 0}, {mStop, POLLIN, 0}};
+    const Clock::time_point until = Clock::now() + time;
+    int ready = -1;
+    do {
+        ready = ::poll(both, 2, millisecondsTo(until));
+    } while (ready < 0 && errno == EINTR);
+    if (ready <= 0)
+        return Came::Nothing;
+    return both[1].revents != 0 ? Came::Stop : Came::Something;
+}
+
+bool PeerConnection::receive(QByteArray& bytes, int size)
+{
+    const int begin = bytes.size();
+    bytes.resize(begin + size);
+    for (int got = 0; got < size;) {
+        const ssize_t count = readSome(bytes.data() + begin + got, size - got);
+        if (count <= 0)
+            return false;
+        got += static_cast<int>(count);
+    }
+    return true;
+}
+
+bool PeerConnection::receiveRequest()
+{
+    Outcome outcome = Outcome::WantsRead;
+    while ((outcome = mTransport->begin()) == Outcome::WantsRead || outcome == Outcome::WantsWrite) {
+        if (!wait(outcome == Outcome::WantsRead ? POLLIN : POLLOUT, end()))
+            return false;
+    }
+    if (outcome != Outcome::Done || !receive(mRequest, kHead))
+        return false;
+    const quint32 size = qFromBigEndian<quint32>(mRequest.constData() + 2);
+    if (mRequest.at(0) != kRequest || size > kLongestRequest) {
+        sendAbort(kByProvider, kUnknownPdu);
+        return false;
+    }
+    if (!receive(mRequest, static_cast<int>(size)))
+        return false;
+    if (!isWellFormedRequest(mRequest.constData() + kHead, size)) {
+        sendAbort(kByProvider, kInvalidValue);
+        return false;
+    }
+    return true;
+}
+
+ssize_t PeerConnection::readSome(char* to, int size)
+{
+    while (mIsOpen && !mIsBroken) {
+        int count = 0;
+        const Outcome outcome = mTransport->read(to, size, count);
+        if (outcome == Outcome::Done) {
+            mBytes += count;
+            return count;
+        }
+        if (outcome == Outcome::Ended)
+            return 0;
+        if (outcome == Outcome::Failed || !wait(outcome == Outcome::WantsRead ? POLLIN : POLLOUT, end()))
+            return -1;
+    }
+    return -1;
+}
+
+ssize_t PeerConnection::read(void* to, size_t size)
+{
+    const int most = static_cast<int>(std::min<size_t>(size, 1 << 20));
+    if (mRequestRead < mRequest.size()) {
+        const int count = std::min(most, mRequest.size() - mRequestRead);
+        std::memcpy(to, mRequest.constData() + mRequestRead, static_cast<size_t>(count));
+        mRequestRead += count;
+        return count;
+    }
+    errno = 0;
+    const ssize_t count = readSome(static_cast<char*>(to), most);
+    if (count > 0 && !mGuard.take(static_cast<const char*>(to), count)) {
+        sendAbort(kByProvider, kInvalidValue);
+        close();
+        return 0;
+    }
+    // An interruption would have the caller come again.
+    return count < 0 ? 0 : count;
+}
+
+ssize_t PeerConnection::write(void* from, size_t size)
+{
+    const Clock::time_point until = Clock::now() + mPatience;
+    const char* bytes = static_cast<const char*>(from);
+    auto left = static_cast<qint64>(size);
+    while (left > 0) {
+        qint64 count = 0;
+        const Outcome outcome = mIsOpen && !mIsBroken
+                                    ? mTransport->write(bytes, left, Http::Transport::More::No, count)
+                                    : Outcome::Failed;
+        if (outcome == Outcome::Done) {
+            bytes += count;
+            left -= count;
+        } else if (outcome == Outcome::Ended || outcome == Outcome::Failed ||
+                   !wait(outcome == Outcome::WantsRead ? POLLIN : POLLOUT, until)) {
+            errno = EPIPE;
+            return -1;
+        }
+    }
+    return static_cast<ssize_t>(size);
+}
+
+OFBool PeerConnection::networkDataAvailable(int timeout)
+{
+    if (mRequestRead < mRequest.size() || mTransport->hasUnread())
+        return OFTrue;
+    return wait(POLLIN, Clock::now() + std::chrono::seconds(std::max(timeout, 0)));
+}
+
+void PeerConnection::sendAbort(unsigned char source, unsigned char reason)
+{
+    char abort[] = {7, 0, 0, 0, 0, 4, 0, 0, static_cast<char>(source), static_cast<char>(reason)};
+    write(abort, sizeof abort);
+}
+
+void PeerConnection::close()
+{
+    if (mIsOpen)
+        mTransport->endWriting();
+    mIsOpen = false;
+}
+
+void PeerConnection::breakOff()
+{
+    mIsBroken = true;
+    ::shutdown(mSocket, SHUT_RDWR);
+}
+
+OFCondition PeerConnection::renegotiate(const char* /*newSuite*/)
+{
+    return EC_IllegalCall;
+}
+
+unsigned long PeerConnection::getPeerCertificate(void* /*to*/, unsigned long /*size*/)
+{
+    return 0;
+}
+
+OFString& PeerConnection::dumpConnectionParameters(OFString& text)
+{
+    return text;
+}
+
+}  // namespace Kdd::Dimse

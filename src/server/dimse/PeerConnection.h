@@ -1,0 +1,90 @@
+#pragma once
+
+#include "server/dimse/PduGuard.h"
+#include "server/http/Transport.h"
+
+#include <QByteArray>
+
+#include <dcmtk/config/osconfig.h>
+
+#include <dcmtk/dcmdata/dcerror.h>
+#include <dcmtk/dcmnet/dcmtrans.h>
+
+#include <atomic>
+#include <chrono>
+#include <memory>
+
+namespace Kdd::Dimse
+{
+
+/// The connection of one association, as DCMTK reads and writes it: plain or over TLS, with an end to every wait, and without
+/// what PduGuard refuses. Used by one thread at a time but for `breakOff`.
+class PeerConnection : public DcmTransportConnection
+{
+public:
+    using Clock = std::chrono::steady_clock;
+
+    enum class Came { Something, Nothing, Stop };
+
+    /// Takes the socket, which does not block. `stop` is a descriptor that can be read from when the server stops.
+    PeerConnection(int socket, std::unique_ptr<Http::Transport> transport, int stop,
+                   std::chrono::seconds patience, const PduLimits& limits);
+    ~PeerConnection() override;
+
+    /// Whom the certificate names that the other side showed.
+    QByteArray certificate() const { return mTransport->peerName(); }
+
+    /// Agrees on encryption, and receives the whole request for an association. False: there is none, and what there is to
+    /// say about that was said.
+    bool receiveRequest();
+
+    /// Waits for a message to begin.
+    Came await(std::chrono::seconds time);
+
+    /// From here on the other side has the time of one message again.
+    void beginMessage();
+
+    /// Of the dataset that follows.
+    void expectDataset(qint64 most) { mGuard.expectDataset(most); }
+
+    /// Says that the association has ended, and why, in the protocol's numbers.
+    void sendAbort(unsigned char source, unsigned char reason);
+
+    /// Ends every wait from now on. On any thread.
+    void breakOff();
+
+    OFCondition serverSideHandshake() override { return EC_Normal; }
+    OFCondition clientSideHandshake() override { return EC_IllegalCall; }
+    OFCondition renegotiate(const char* newSuite) override;
+    ssize_t read(void* to, size_t size) override;
+    ssize_t write(void* from, size_t size) override;
+    void close() override;
+    void closeTransportConnection() override { close(); }
+    unsigned long getPeerCertificateLength() override { return 0; }
+    unsigned long getPeerCertificate(void* to, unsigned long size) override;
+    OFBool networkDataAvailable(int timeout) override;
+    OFBool isTransparentConnection() override { return OFFalse; }
+    OFString& dumpConnectionParameters(OFString& text) override;
+
+private:
+    using Outcome = Http::Transport::Outcome;
+
+    bool receive(QByteArray& bytes, int size);
+    ssize_t readSome(char* to, int size);
+    bool wait(short events, Clock::time_point end) const;
+    Clock::time_point end() const;
+
+    const int mSocket;
+    const int mStop;
+    const std::chrono::seconds mPatience;
+    std::unique_ptr<Http::Transport> mTransport;
+    PduGuard mGuard;
+    QByteArray mRequest;  // that was received and not read yet
+    int mRequestRead = 0;
+    Clock::time_point mBegun = Clock::now();
+    qint64 mBytes = 0;  // since then
+    bool mIsOpen = true;
+    std::atomic<bool> mIsBroken{false};
+};
+
+}  // namespace Kdd::Dimse

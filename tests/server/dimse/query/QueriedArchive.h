@@ -1,0 +1,191 @@
+#pragma once
+
+#include "server/Server.h"
+#include "server/dicomweb/search/SearchedArchive.h"
+#include "server/http/Client.h"
+#include "support/FileContent.h"
+
+#include <QtEndian>
+
+#include <kddlib/DicomFileReader.h>
+#include <netinet/in.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <utility>
+
+namespace Kdd
+{
+
+/// An archive that answers associations, and DCMTK's tools that ask it. "SELF" is where the tools take objects.
+class QueriedArchive : public DicomWeb::SearchedArchive
+{
+protected:
+    void SetUp() override
+    {
+        SearchedArchive::SetUp();
+        Kxg::SetDatabaseServer(address());
+        mSettings.http.address = {"127.0.0.1", 0};
+        mSettings.objects.emplace();
+        mSettings.objects->folder = path("objects").toUtf8();
+        mSettings.objects->freeBytes = 0;
+        mSettings.dimse.emplace();
+        mSettings.dimse->address = {"127.0.0.1", 0};
+        mSettings.dimse->rules = Dimse::AssociationRules::open();
+        mSelf = freePort();
+        mSettings.dimse->rules.peers.insert("SELF", {{}, "127.0.0.1", mSelf, false, Dimse::kAllRights});
+        mSettings.dimse->rules.peers.insert("NOBODY",
+                                            {{}, "127.0.0.1", freePort(), false, Dimse::kAllRights});
+        mSettings.dimse->rules.peers.insert("UNCALLED", {{}, {}, 0, false, Dimse::kAllRights});
+    }
+
+    /// One that nobody listens on; a moment later somebody may.
+    static quint16 freePort()
+    {
+        sockaddr_in at = {};
+        socklen_t size = sizeof at;
+        at.sin_family = AF_INET;
+        at.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+        const int socket = ::socket(AF_INET, SOCK_STREAM, 0);
+        EXPECT_EQ(::bind(socket, reinterpret_cast<sockaddr*>(&at), size), 0);
+        EXPECT_EQ(::getsockname(socket, reinterpret_cast<sockaddr*>(&at), &size), 0);
+        ::close(socket);
+        return ntohs(at.sin_port);
+    }
+
+    void start()
+    {
+        Result result;
+        mServer.reset();
+        mServer = Server::make(mSettings, result);
+        ASSERT_NE(mServer, nullptr) << result.text().toStdString();
+        ASSERT_TRUE(mServer->start().good());
+    }
+
+    /// Starts a tool; `keys` as "PatientName=D*".
+    std::unique_ptr<QProcess> begin(const char* tool, const QStringList& options, const QStringList& keys,
+                                    const QStringList& files = {})
+    {
+        mAnswers = path("answers") + QString::number(++mRuns);
+        QDir().mkpath(mAnswers);
+        const QByteArray dicom = mServer->dimseAddress();
+        QStringList arguments = {QStringLiteral("-v"), QStringLiteral("-od"), mAnswers};
+        arguments += options;
+        for (const QString& key : keys)
+            arguments << QStringLiteral("-k") << key;
+        arguments << QStringLiteral("127.0.0.1")
+                  << QString::fromLatin1(dicom.mid(dicom.lastIndexOf(':') + 1));
+        arguments += files;
+        auto process = std::make_unique<QProcess>();
+        process->setProcessChannelMode(QProcess::MergedChannels);
+        process->start(QLatin1String(tool), arguments);
+        return process;
+    }
+
+    std::string run(const char* tool, const QStringList& options, const QStringList& keys)
+    {
+        const std::unique_ptr<QProcess> process = begin(tool, options, keys);
+        EXPECT_TRUE(process->waitForFinished(120000)) << tool << process->errorString().toStdString();
+        return process->readAll().toStdString();
+    }
+
+    std::string find(const QStringList& keys, const char* root = "-S")
+    {
+        return run("findscu", {QLatin1String(root), QStringLiteral("-X")}, keys);
+    }
+
+    std::string move(const QStringList& keys, const QStringList& more = {}, const char* to = "SELF")
+    {
+        return run("movescu",
+                   QStringList{QStringLiteral("-S"), QStringLiteral("-aem"), QLatin1String(to),
+                               QStringLiteral("+P"), QString::number(mSelf)} +
+                       more,
+                   keys);
+    }
+
+    std::string get(const QStringList& keys, const QStringList& more = {})
+    {
+        return run("getscu", QStringList{QStringLiteral("-S")} + more, keys);
+    }
+
+    using SearchedArchive::get;
+
+    /// The dataset of an object as it is retrieved over HTTP, as stored.
+    QByteArray retrieved(const char* path) const
+    {
+        Client client(mServer->address());
+        client.get(QByteArray("/dicom-web/") + path, "Accept: application/dicom; transfer-syntax=*\r\n");
+        return datasetOf(client.reply().body);
+    }
+
+    /// What stands behind the meta header.
+    static QByteArray datasetOf(const QByteArray& file)
+    {
+        constexpr int kToLength = 140;
+        return file.size() < kToLength + 4
+                   ? "none: " + file
+                   : file.mid(kToLength + 4 + qFromLittleEndian<qint32>(file.constData() + kToLength));
+    }
+
+    /// The datasets of the objects that the last run left, as they came.
+    std::vector<QByteArray> takenDatasets() const
+    {
+        std::vector<QByteArray> datasets;
+        const QDir folder(mAnswers);
+        for (const QString& name : folder.entryList(QDir::Files, QDir::Name))
+            datasets.push_back(datasetOf(fileContent(folder.filePath(name))));
+        return datasets;
+    }
+
+    /// What the last run left, in the order of the names of its files.
+    std::vector<DcmFileFormat> answers() const
+    {
+        std::vector<DcmFileFormat> files;
+        const QDir folder(mAnswers);
+        for (const QString& name : folder.entryList(QDir::Files, QDir::Name)) {
+            files.emplace_back();
+            EXPECT_TRUE(files.back().loadFile(folder.filePath(name).toUtf8().constData()).good());
+        }
+        return files;
+    }
+
+    /// Of those an attribute, sorted and separated by blanks.
+    std::string answered(const DcmTagKey& key) const
+    {
+        QStringList values;
+        for (DcmFileFormat& file : answers())
+            values << QString::fromStdString(text(file, key));
+        values.sort();
+        return values.join(QLatin1Char(' ')).toStdString();
+    }
+
+    static std::string text(DcmFileFormat& file, const DcmTagKey& key)
+    {
+        OFString value;
+        return file.getDataset()->findAndGetOFStringArray(key, value).good() ? std::string(value.c_str())
+                                                                             : "-";
+    }
+
+    ServerSettings mSettings;
+    quint16 mSelf = 0;
+    QString mAnswers;
+
+private:
+    int mRuns = 0;
+    std::unique_ptr<Server> mServer;
+};
+
+/// "STUDY" and the keys that ask on that level.
+inline QStringList onLevel(const char* level, QStringList keys)
+{
+    keys.prepend(QStringLiteral("QueryRetrieveLevel=") + QLatin1String(level));
+    return keys;
+}
+
+/// Separated by "|".
+inline QStringList keysOf(const char* keys)
+{
+    return QString::fromUtf8(keys).split(QLatin1Char('|'));
+}
+
+}  // namespace Kdd

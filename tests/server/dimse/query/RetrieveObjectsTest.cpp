@@ -1,0 +1,335 @@
+#include "QueriedArchive.h"
+#include "support/RealFiles.h"
+
+#include <dcmtk/dcmnet/assoc.h>
+#include <dcmtk/dcmnet/dimse.h>
+#include <gmock/gmock.h>
+
+#include <thread>
+
+using namespace Kdd;
+using testing::HasSubstr;
+
+namespace
+{
+
+const char* const kBitByBit = "+B";
+
+class RetrieveObjects : public QueriedArchive
+{
+protected:
+    /// Two images of one series and one of another.
+    void fill()
+    {
+        store("a",
+              anImage("1.1.1").inStudy("1").inSeries("1.1").with(DCM_PatientID, "P1").words({1, 2, 3, 4}));
+        store("b",
+              anImage("1.1.2").inStudy("1").inSeries("1.1").with(DCM_PatientID, "P1").words({5, 6, 7, 8}));
+        store("c", anImage("1.2.1").inStudy("1").inSeries("1.2").with(DCM_PatientID, "P1"));
+        store("d", anImage("2.1.1").inStudy("2").inSeries("2.1").with(DCM_PatientID, "P2"));
+        add();
+        start();
+    }
+
+    /// As `kdd qa` does; with `oldStudy` the image comes from there.
+    void correct(const char* study, const char* image, const char* oldStudy, const char* tag,
+                 const char* value)
+    {
+        QFile job(path("job.xml"));
+        ASSERT_TRUE(job.open(QIODevice::WriteOnly));
+        job.write("<Job><Timestamp>20240131120000</Timestamp><Substitutions OldSUID='" +
+                  QByteArray(oldStudy) + "'><Tag " + tag + "><Value>" + value +
+                  "</Value></Tag></Substitutions></Job>");
+        job.close();
+        kdd({QStringLiteral("qa"), path("job.xml"), QStringLiteral("--study"), QString::fromLatin1(study),
+             QStringLiteral("--image"), QString::fromLatin1(image)});
+    }
+
+    std::string getStudy(const char* uid, const QStringList& more = {})
+    {
+        return get(onLevel("STUDY", {QStringLiteral("StudyInstanceUID=") + QLatin1String(uid)}), more);
+    }
+
+    std::string moveStudy(const char* uid, const QStringList& more = {}, const char* to = "SELF")
+    {
+        return move(onLevel("STUDY", {QStringLiteral("StudyInstanceUID=") + QLatin1String(uid)}), more, to);
+    }
+};
+
+INSTANTIATE_TEST_SUITE_P(Engines, RetrieveObjects, testing::Values(DicomWeb::Engine::Sqlite),
+                         DicomWeb::engineName);
+
+const char* const kCorrectedName = "Group='0010' Element='0010'";
+const char* const kStudyTag = "Group='0020' Element='000d'";
+
+struct Wish
+{
+    const char* level;
+    const char* keys;
+    const char* images;
+};
+
+const Wish kWishes[] = {
+    {"STUDY", "StudyInstanceUID=1", "1.1.1 1.1.2 1.2.1"},
+    {"STUDY", "StudyInstanceUID=1\\2", "1.1.1 1.1.2 1.2.1 2.1.1"},
+    {"SERIES", "StudyInstanceUID=1|SeriesInstanceUID=1.1", "1.1.1 1.1.2"},
+    {"SERIES", "SeriesInstanceUID=1.2\\2.1", "1.2.1 2.1.1"},
+    {"IMAGE", "StudyInstanceUID=1|SeriesInstanceUID=1.1|SOPInstanceUID=1.1.2", "1.1.2"},
+    {"IMAGE", "SOPInstanceUID=2.1.1", "2.1.1"},
+    {"STUDY", "PatientID=P2|StudyInstanceUID=1\\2", "2.1.1"},
+    {"STUDY", "StudyInstanceUID=9", ""},
+};
+
+TEST_P(RetrieveObjects, GivesWhatIsNamedOnEveryLevel)
+{
+    fill();
+    for (const Wish& each : kWishes) {
+        const std::string got = get(onLevel(each.level, keysOf(each.keys)));
+        EXPECT_EQ(answered(DCM_SOPInstanceUID), each.images) << "C-GET " << each.keys << "\n" << got;
+        const std::string moved = move(onLevel(each.level, keysOf(each.keys)));
+        EXPECT_EQ(answered(DCM_SOPInstanceUID), each.images) << "C-MOVE " << each.keys << "\n" << moved;
+        EXPECT_THAT(moved, HasSubstr("Received Final Move Response (Success)")) << each.keys;
+    }
+    run("getscu", {QStringLiteral("-P")}, onLevel("PATIENT", {QStringLiteral("PatientID=P1")}));
+    EXPECT_EQ(answered(DCM_SOPInstanceUID), "1.1.1 1.1.2 1.2.1");
+}
+
+TEST_P(RetrieveObjects, GivesThemCorrectedAsOverHttp)
+{
+    fill();
+    correct("1", "1.1.1", "", kCorrectedName, "Right^Name");
+    const QStringList keys =
+        onLevel("IMAGE", keysOf("StudyInstanceUID=1|SeriesInstanceUID=1.1|SOPInstanceUID=1.1.1"));
+    get(keys, {QLatin1String(kBitByBit)});
+    ASSERT_EQ(takenDatasets().size(), 1U);
+    EXPECT_EQ(takenDatasets().front(), retrieved("studies/1/series/1.1/instances/1.1.1"));
+    EXPECT_EQ(answered(DCM_PatientName), "Right^Name");
+    move(keys, {QLatin1String(kBitByBit)});
+    ASSERT_EQ(takenDatasets().size(), 1U);
+    EXPECT_EQ(takenDatasets().front(), retrieved("studies/1/series/1.1/instances/1.1.1"));
+}
+
+TEST_P(RetrieveObjects, GivesAMovedImageUnderItsNewStudyOnly)
+{
+    fill();
+    correct("2", "1.1.1", "1", kStudyTag, "2");
+    getStudy("1");
+    EXPECT_EQ(answered(DCM_SOPInstanceUID), "1.1.2 1.2.1");
+    getStudy("2");
+    EXPECT_EQ(answered(DCM_SOPInstanceUID), "1.1.1 2.1.1");
+    EXPECT_EQ(answered(DCM_StudyInstanceUID), "2 2");
+    find(onLevel("IMAGE", keysOf("SOPInstanceUID=1.1.1|StudyInstanceUID")));
+    EXPECT_EQ(answered(DCM_StudyInstanceUID), "2");
+}
+
+const char* const kNotUnderstood[] = {
+    "StudyInstanceUID=1",
+    "QueryRetrieveLevel=STUDY",
+    "QueryRetrieveLevel=STUDY|StudyInstanceUID=*",
+    "QueryRetrieveLevel=STUDY|StudyInstanceUID=1|PatientID=P*",
+    "QueryRetrieveLevel=PATIENT|PatientID=P1",
+};
+
+TEST_P(RetrieveObjects, RefusesWhatNamesNothing)
+{
+    fill();
+    for (const char* keys : kNotUnderstood) {
+        EXPECT_THAT(move(keysOf(keys)), HasSubstr("IdentifierDoesNotMatchSOPClass")) << keys;
+        EXPECT_THAT(get(keysOf(keys)), HasSubstr("IdentifierDoesNotMatchSOPClass")) << keys;
+        EXPECT_TRUE(answers().empty()) << keys;
+    }
+}
+
+TEST_P(RetrieveObjects, TellsADestinationThatItCannotCall)
+{
+    fill();
+    EXPECT_THAT(moveStudy("1", {}, "STRANGER"), HasSubstr("MoveDestinationUnknown"));
+    EXPECT_THAT(moveStudy("1", {}, "UNCALLED"), HasSubstr("MoveDestinationUnknown"));
+    const std::string said = moveStudy("1", {QStringLiteral("-d")}, "NOBODY");
+    EXPECT_THAT(said, HasSubstr("OutOfResourcesSubOperations"));
+    EXPECT_THAT(said, HasSubstr("Failed Suboperations          : 3"));
+}
+
+TEST_P(RetrieveObjects, TellsWhichOfThemCannotBeSent)
+{
+    fill();
+    QFile::remove(path("images/b"));
+    const std::string moved = moveStudy("1", {QStringLiteral("-d")});
+    EXPECT_EQ(answered(DCM_SOPInstanceUID), "1.1.1 1.2.1");
+    EXPECT_THAT(moved, HasSubstr("Warning: SubOperationsCompleteOneOrMoreFailures"));
+    EXPECT_THAT(moved, HasSubstr("(0008,0058) UI [1.1.2]"));
+    EXPECT_THAT(moved, HasSubstr("Completed Suboperations       : 2"));
+    const std::string got = getStudy("1", {QStringLiteral("-d")});
+    EXPECT_EQ(answered(DCM_SOPInstanceUID), "1.1.1 1.2.1");
+    EXPECT_THAT(got, HasSubstr("(0008,0058) UI [1.1.2]"));
+}
+
+struct StoredForm
+{
+    const char* folder;
+    E_TransferSyntax syntax;
+    const char* option;  ///< by which the tool takes it
+};
+
+const StoredForm kForms[] = {
+    {"transfer-syntaxes/rle", EXS_RLELossless, "+xr"},
+    {"transfer-syntaxes/jpeg-ls-80", EXS_JPEGLSLossless, "+xt"},
+    {"transfer-syntaxes/jpeg2000-lossless-90", EXS_JPEG2000LosslessOnly, "+xv"},
+    {"transfer-syntaxes/jpeg-baseline-50", EXS_JPEGProcess1, "+xy"},
+};
+
+TEST_P(RetrieveObjects, GivesAsStoredWhatIsTakenSoAndDecodesTheRest)
+{
+    if (realFilesFolder().isEmpty())
+        GTEST_SKIP() << "KDD_TEST_DATA is not set";
+    int number = 0;
+    for (const StoredForm& each : kForms)
+        ASSERT_TRUE(QFile::copy(realFiles(each.folder).first(), path("images/") + QString::number(number++)));
+    add();
+    start();
+    number = 0;
+    for (const StoredForm& each : kForms) {
+        DcmFileFormat file;
+        ASSERT_TRUE(file.loadFile((path("images/") + QString::number(number++)).toUtf8().constData()).good());
+        const std::string uid = text(file, DCM_StudyInstanceUID);
+        moveStudy(uid.c_str(), {QLatin1String(each.option)});
+        ASSERT_EQ(answers().size(), 1U) << each.folder;
+        EXPECT_EQ(answers().front().getDataset()->getOriginalXfer(), each.syntax) << each.folder;
+        for (const std::string& said :
+             {moveStudy(uid.c_str(), {QStringLiteral("+xi")}), getStudy(uid.c_str())}) {
+            ASSERT_EQ(answers().size(), 1U) << each.folder << said;
+            EXPECT_FALSE(DcmXfer(answers().front().getDataset()->getOriginalXfer()).isEncapsulated())
+                << each.folder;
+        }
+    }
+}
+
+TEST_P(RetrieveObjects, EndsWhenItIsCancelled)
+{
+    for (int i = 0; i < 60; ++i) {
+        const QByteArray uid = "7." + QByteArray::number(i);
+        store(uid.constData(), anImage(uid.constData()).inStudy("7").inSeries("7.0"));
+    }
+    add();
+    start();
+    EXPECT_THAT(moveStudy("7", {QStringLiteral("--cancel"), QStringLiteral("1")}),
+                HasSubstr("Cancel: SubOperationsTerminatedDueToCancelIndication"));
+    EXPECT_LT(answers().size(), 60U);
+}
+
+/// Takes objects until it has had enough, and then goes without a word, in the middle of one.
+class DyingDestination
+{
+public:
+    DyingDestination(quint16 port, int objects)
+    {
+        EXPECT_TRUE(ASC_initializeNetwork(NET_ACCEPTOR, port, 30, &mNetwork).good());
+        mThread = std::thread([this, objects] { serve(objects); });
+    }
+    ~DyingDestination()
+    {
+        mThread.join();
+        ASC_dropNetwork(&mNetwork);
+    }
+
+private:
+    void serve(int objects)
+    {
+        T_ASC_Association* association = nullptr;
+        const char* const syntaxes[] = {UID_LittleEndianExplicitTransferSyntax};
+        const char* const classes[] = {UID_SecondaryCaptureImageStorage};
+        ASSERT_TRUE(ASC_receiveAssociation(mNetwork, &association, ASC_DEFAULTMAXPDU).good());
+        ASC_acceptContextsWithPreferredTransferSyntaxes(
+            association->params, const_cast<const char**>(classes), 1, const_cast<const char**>(syntaxes), 1);
+        ASSERT_TRUE(ASC_acknowledgeAssociation(association).good());
+        for (int i = 0; i <= objects; ++i) {
+            T_DIMSE_Message message;
+            T_ASC_PresentationContextID id = 0;
+            DcmDataset* dataset = nullptr;
+            ASSERT_TRUE(DIMSE_receiveCommand(association, DIMSE_BLOCKING, 0, &id, &message, nullptr).good());
+            if (i < objects)
+                DIMSE_storeProvider(association, id, &message.msg.CStoreRQ, nullptr, 0, &dataset, nullptr,
+                                    nullptr, DIMSE_BLOCKING, 0);
+            delete dataset;
+        }
+        ASC_dropAssociation(association);
+        ASC_destroyAssociation(&association);
+    }
+
+    T_ASC_Network* mNetwork = nullptr;
+    std::thread mThread;
+};
+
+TEST_P(RetrieveObjects, TellsWhatADestinationTookThatDied)
+{
+    const quint16 port = freePort();
+    mSettings.dimse->rules.peers.insert("DYING", {{}, "127.0.0.1", port, false, Dimse::kAllRights});
+    fill();
+    std::string said;
+    {
+        const DyingDestination destination(port, 1);
+        said =
+            run("movescu",
+                {QStringLiteral("-S"), QStringLiteral("-d"), QStringLiteral("-aem"), QStringLiteral("DYING")},
+                onLevel("STUDY", keysOf("StudyInstanceUID=1")));
+    }
+    EXPECT_THAT(said, HasSubstr("Warning: SubOperationsCompleteOneOrMoreFailures"));
+    EXPECT_THAT(said, HasSubstr("Completed Suboperations       : 1"));
+    EXPECT_THAT(said, HasSubstr("Failed Suboperations          : 2"));
+}
+
+TEST_P(RetrieveObjects, OutlivesHostileIdentifiers)
+{
+    fill();
+    DatasetBuilder deep = anItem().with(DCM_CodeValue, "deep");
+    for (int i = 0; i < 1000; ++i)
+        deep = anItem().withItem(DCM_ConceptNameCodeSequence, deep);
+    const std::pair<const char*, DatasetBuilder> hostile[] = {
+        {"deep", deep},
+        {"nested",
+         anItem().withItem(DCM_RequestAttributesSequence, anItem().with(DCM_RequestedProcedureID, "1"))},
+        {"long", anItem().withLong(DCM_PatientComments, 9000)},
+        {"huge", anItem().withLong(DCM_TextValue, 200000)},
+        {"endless", anItem().withLong(DCM_TextValue, 3000000)},
+    };
+    for (const auto& each : hostile) {
+        const QByteArray file = path(each.first).toUtf8();
+        DcmDataset dataset(each.second.build());
+        DcmFileFormat identifier(&dataset);
+        ASSERT_TRUE(identifier.saveFile(file.constData(), EXS_LittleEndianImplicit).good());
+        for (const char* tool : {"findscu", "getscu", "movescu"}) {
+            const std::unique_ptr<QProcess> process =
+                begin(tool, {QStringLiteral("-S")}, onLevel("STUDY", keysOf("PatientName=*")),
+                      {QString::fromUtf8(file)});
+            EXPECT_TRUE(process->waitForFinished(120000)) << tool << each.first;
+        }
+        EXPECT_THAT(find(onLevel("STUDY", keysOf("StudyInstanceUID=1"))), HasSubstr("(Success)"))
+            << each.first;
+    }
+}
+
+TEST_P(RetrieveObjects, AnswersManyAtOnceThoughSomeAreKilled)
+{
+    fill();
+    std::vector<std::unique_ptr<QProcess>> asking;
+    std::vector<QString> folders;
+    for (int i = 0; i < 24; ++i) {
+        asking.push_back(i % 3 == 0 ? begin("findscu", {QStringLiteral("-S"), QStringLiteral("-X")},
+                                            onLevel("IMAGE", keysOf("StudyInstanceUID=1|SOPInstanceUID")))
+                                    : begin("getscu", {QStringLiteral("-S")},
+                                            onLevel("STUDY", keysOf("StudyInstanceUID=1"))));
+        folders.push_back(mAnswers);
+    }
+    for (std::size_t i = 0; i < asking.size(); ++i) {
+        if (i % 4 == 1)
+            asking[i]->kill();
+        EXPECT_TRUE(asking[i]->waitForFinished(120000));
+        mAnswers = folders[i];
+        const std::string expected = i % 4 != 1 ? "1.1.1 1.1.2 1.2.1" : answered(DCM_SOPInstanceUID);
+        EXPECT_EQ(answered(DCM_SOPInstanceUID), expected) << i;
+    }
+    moveStudy("2");
+    EXPECT_EQ(answered(DCM_SOPInstanceUID), "2.1.1");
+}
+
+}  // namespace
