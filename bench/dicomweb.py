@@ -14,8 +14,6 @@ import json
 import os
 import re
 import shutil
-import signal
-import socket
 import statistics
 import struct
 import subprocess
@@ -23,72 +21,24 @@ import sys
 import tempfile
 import time
 
+from servers import changed, ct_slices, noise, start_kdd, start_peer
+
 STUDY = "1.2.826.0.1.3680043.2.1143.1"
 SERIES = (STUDY + ".1", STUDY + ".2")
 IMAGES = 1000
 SIDE = 512  # rows and columns
-TICKS = os.sysconf("SC_CLK_TCK")
-PLUGIN = "/usr/share/orthanc/plugins/libOrthancDicomWeb.so"
 LIST = "/studies?limit=101&offset=0&fuzzymatching=true&includefield=00081030%2C00080060%2C00080090%2C00100030"
 JSON = "application/dicom+json"
 FRAME = 'multipart/related; type="application/octet-stream"; transfer-syntax="*"'
 OBJECT = 'multipart/related; type="application/dicom"; transfer-syntax="*"'
 
 
-def elements(data):
-    """Start of the value, its length and its bytes' place in front, for each attribute of the outermost level."""
-    at = 132
-    while at < len(data):
-        group, number = struct.unpack_from("<HH", data, at)
-        if data[at + 4:at + 6] in (b"OB", b"OW", b"SQ", b"UN", b"UT", b"UC", b"UR", b"OF", b"OD", b"OL"):
-            length, value = struct.unpack_from("<I", data, at + 8)[0], at + 12
-        else:
-            length, value = struct.unpack_from("<H", data, at + 6)[0], at + 8
-        if length == 0xFFFFFFFF:  # a sequence of unknown length ends where its outermost delimiter stands
-            depth, end = 0, value
-            while True:
-                tag, size = data[end:end + 4], struct.unpack_from("<I", data, end + 4)[0]
-                if tag == b"\xfe\xff\xdd\xe0":
-                    break
-                end += 8 if size == 0xFFFFFFFF else 8 + size
-                if tag == b"\xfe\xff\x00\xe0" and size == 0xFFFFFFFF:
-                    end = data.index(b"\xfe\xff\x0d\xe0", end) + 8
-            length = end + 8 - value
-        yield (group << 16) | number, at, value, length
-        at = value + length
-
-
-def changed(data, values):
-    """The file with other values of some attributes, and without the length of its meta header, which nobody needs."""
-    out, done = bytearray(data[:132]), 132
-    for tag, at, value, length in elements(data):
-        out += data[done:at]
-        done = at
-        if tag == 0x00020000:
-            done = value + length
-        elif tag in values:
-            new = values[tag]
-            new += (b"\0" if data[at + 4:at + 6] in (b"UI", b"OW") else b" ") * (len(new) % 2)
-            size = struct.pack("<I" if value - at == 12 else "<H", len(new))
-            out += data[at:value - len(size)] + size + new
-            done = value + length
-    return bytes(out + data[done:])
-
-
 def make_archive(kdd, folder):
     """Files of both servers; what is in them does not matter, but what they are like does."""
-    day = os.path.join(folder, "day")
-    subprocess.run([kdd, "--quiet", "sample", day, "--images", "200"], check=True)
-    slices = []
-    for place, _, names in sorted(os.walk(os.path.join(day, "CT-1"))):
-        if len(names) > 20:
-            slices = [open(os.path.join(place, name), "rb").read() for name in sorted(names) if name.endswith(".dcm")]
-            break
+    slices = ct_slices(kdd, folder)
     files = os.path.join(folder, "files")
     os.mkdir(files)
-    # Noise that compresses as badly as that of a detector.
-    pixels = bytearray(os.urandom(SIDE * SIDE * 2))
-    pixels[1::2] = bytes(byte & 15 for byte in pixels[1::2])
+    pixels = noise(SIDE)
     for number in range(IMAGES):
         series = 0 if number < 499 else 1
         uid = "%s.%d" % (SERIES[series], number + 1)
@@ -101,7 +51,7 @@ def make_archive(kdd, folder):
             0x00280010: struct.pack("<H", SIDE), 0x00280011: struct.pack("<H", SIDE), 0x7FE00010: bytes(pixels)})
         with open(os.path.join(files, "%04d.dcm" % number), "wb") as file:
             file.write(data)
-    shutil.rmtree(day)
+    day = os.path.join(folder, "day")
     studies = 0
     for seed in range(1, 9):
         subprocess.run([kdd, "--quiet", "sample", day, "--images", "23", "--seed", str(seed)], check=True)
@@ -111,78 +61,6 @@ def make_archive(kdd, folder):
                 studies += 1
         shutil.rmtree(day)
     return files
-
-
-def free_port():
-    with socket.socket() as probe:
-        probe.bind(("127.0.0.1", 0))
-        return probe.getsockname()[1]
-
-
-class Server:
-    """A process that answers DICOMweb at a port of this machine until it is stopped."""
-
-    def __init__(self, name, command, port, prefix="/dicom-web", env=None):
-        self.name, self.port, self.prefix = name, port, prefix
-        self.process = subprocess.Popen(command, env={**os.environ, **(env or {})},
-                                        stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL)
-        for _ in range(300):
-            try:
-                socket.create_connection(("127.0.0.1", port), 1).close()
-                return
-            except OSError:
-                if self.process.poll() is not None:
-                    break
-                time.sleep(0.1)
-        self.stop()
-        sys.exit(name + " does not start")
-
-    def stop(self):
-        self.process.send_signal(signal.SIGTERM)
-        self.process.wait()
-
-    def cpu(self):
-        """Processor time so far [s]."""
-        with open("/proc/%d/stat" % self.process.pid) as file:
-            fields = file.read().rpartition(")")[2].split()
-        return (int(fields[11]) + int(fields[12])) / TICKS
-
-    def memory(self):
-        with open("/proc/%d/status" % self.process.pid) as file:
-            return int(re.search(r"VmHWM:\s+(\d+)", file.read()).group(1)) / 1024
-
-
-def start_kdd(kdd, folder, files, kept):
-    env = {"KDD_STORE": os.path.join(folder, "store"), "KDD_ANSWERS_SIZE": "1024" if kept else "0"}
-    if files:
-        subprocess.run([kdd, "--quiet", "add", files], check=True, env={**os.environ, **env})
-    port = free_port()
-    return Server("kdd" if kept else "kdd, nothing kept", [kdd, "serve", "--listen", "127.0.0.1:%d" % port], port,
-                  env=env)
-
-
-def start_peer(folder, files):
-    missing = [part for part in ("Orthanc", PLUGIN) if not (shutil.which(part) or os.path.exists(part))]
-    if missing:
-        print("No comparison: %s is missing (apt-get install orthanc orthanc-dicomweb)\n" % " and ".join(missing))
-        return None
-    port = free_port()
-    config = os.path.join(folder, "peer.json")
-    with open(config, "w") as file:
-        json.dump({"StorageDirectory": os.path.join(folder, "peer"), "IndexDirectory": os.path.join(folder, "peer"),
-                   "HttpPort": port, "DicomServerEnabled": False, "RemoteAccessAllowed": False,
-                   "KeepAlive": True, "Plugins": [PLUGIN]}, file)
-    peer = Server("Orthanc", ["Orthanc", config], port)
-    link = http.client.HTTPConnection("127.0.0.1", port)
-    for place, _, names in os.walk(files):
-        for name in names:
-            with open(os.path.join(place, name), "rb") as file:
-                link.request("POST", "/instances", file.read())
-            answer = link.getresponse()
-            answer.read()
-            if answer.status not in (200, 400):  # a volume file is no instance
-                sys.exit("Orthanc takes no file: %d" % answer.status)
-    return peer
 
 
 def ask(link, server, path, headers):
@@ -284,9 +162,11 @@ def main():
     servers = []
     try:
         files = make_archive(kdd, folder)
-        kept = start_kdd(kdd, folder, files, True)
+        subprocess.run([kdd, "--quiet", "add", files], check=True,
+                       env={**os.environ, "KDD_STORE": os.path.join(folder, "store")})
+        kept = start_kdd(kdd, folder)
         servers.append(kept)
-        unkept = start_kdd(kdd, folder, None, False)
+        unkept = start_kdd(kdd, folder, "kdd, nothing kept", env={"KDD_ANSWERS_SIZE": "0"})
         servers.append(unkept)
         peer = start_peer(folder, files)
         if peer:

@@ -17,6 +17,8 @@ import sys
 import tempfile
 import time
 
+from servers import start_postgres
+
 TICK = 1000 / os.sysconf("SC_CLK_TCK")  # [ms]
 
 # The study list of a common viewer, and what its users add in front of it.
@@ -45,11 +47,6 @@ QUESTIONS = [
     ("by name, page 50", "orderby=PatientName&" + LIST.replace("offset=0", "offset=5000")),
     ("one study", "StudyInstanceUID=1.2.3.4711&" + LIST),
 ]
-
-START_POSTGRES = r"""set -- /usr/lib/postgresql/*/bin
-if [ $(id -u) = 0 ]; then chown -R nobody . && S="--reuid nobody --regid nogroup --clear-groups"; fi
-[ -d data ] || setpriv $S $1/initdb -D data -U kdd -A trust -E UTF8 --no-sync >/dev/null
-exec setpriv --pdeathsig QUIT $S $1/postgres -D data -k $PWD -c listen_addresses= -c fsync=off $PLANS"""
 
 PLANS = "-c session_preload_libraries=auto_explain -c auto_explain.log_min_duration=0 -c auto_explain.log_analyze=on"
 
@@ -112,20 +109,10 @@ def main():
     kept = tempfile.TemporaryDirectory(prefix="kddsearches") if len(sys.argv) < 4 else None
     folder = kept.name if kept else os.path.abspath(sys.argv[3])
     os.makedirs(folder + "/store/meta", exist_ok=True)
-    os.makedirs(folder + "/postgres", exist_ok=True)
-    os.chmod(folder, 0o755)
-    log = folder + "/postgres.log"
-    postgres = subprocess.Popen(["sh", "-c", START_POSTGRES], cwd=folder + "/postgres", stderr=open(log, "w"),
-                                env=dict(os.environ, PLANS=PLANS if "KDD_BENCH_PLANS" in os.environ else ""))
+    postgres, address = start_postgres(folder, PLANS if "KDD_BENCH_PLANS" in os.environ else "")
     try:
-        while "ready to accept connections" not in open(log).read():
-            assert postgres.poll() is None, open(log).read()
-            time.sleep(0.1)
-        where = "host=" + folder + "/postgres"
-        subprocess.run(["psql", "-q", "-c", "CREATE DATABASE kdd", f"postgresql://kdd@/postgres?{where}"],
-                       stderr=subprocess.DEVNULL, check=False)
         engines = [("SQLite", f"sqlite:{folder}/kdd.sqlite", None),
-                   ("PostgreSQL", f"postgresql://kdd@/kdd?{where}", postgres.pid)]
+                   ("PostgreSQL", address, postgres.pid)]
         for engine, address, database in engines:
             fill(build, address)
             print(f"{engine:24}{'found':>6}{'server':>10}{'database':>10}{'together':>10}{'median':>10}")

@@ -1,6 +1,9 @@
 #include "platform/os/StagedFile.h"
 
+#include "platform/os/RandomAccessFile.h"
+
 #include <fcntl.h>
+#include <libdeflate.h>
 #include <sys/file.h>
 #include <sys/stat.h>
 #include <sys/statvfs.h>
@@ -16,6 +19,8 @@ namespace
 
 constexpr mode_t kFileMode = 0666;    // less the umask
 constexpr mode_t kFolderMode = 0777;  // likewise
+
+constexpr qint64 kBlock = 256 * 1024;  // [bytes]
 
 SystemResult resultOf(int answer)
 {
@@ -57,6 +62,7 @@ SystemResult StagedFile::append(const char* bytes, qint64 count)
             return SystemResult::of(errno);
         // A short write is an answer, not a fault: the rest goes next, and tells what is wrong.
         const qint64 done = written > 0 ? written : 0;
+        mChecksum = libdeflate_crc32(mChecksum, bytes, static_cast<std::size_t>(done));
         bytes += done;
         count -= done;
         mSize += done;
@@ -74,6 +80,14 @@ SystemResult StagedFile::flush()
     SystemResult flushed = resultOf(::fdatasync(mDescriptor));
     close();
     return flushed;
+}
+
+SystemResult StagedFile::rename(const QByteArray& path)
+{
+    if (::rename(mPath.constData(), path.constData()) != 0)
+        return SystemResult::of(errno);
+    mPath = path;
+    return {};
 }
 
 SystemResult StagedFile::linkTo(const QByteArray& path) const
@@ -106,6 +120,35 @@ SystemResult makeLastingFolder(const QByteArray& path)
     if (made.good() && ::mkdir(path.constData(), kFolderMode) != 0 && errno != EEXIST)
         made = SystemResult::of(errno);
     return made.good() ? flushFolder(above) : made;
+}
+
+SystemResult flushFile(const QByteArray& path)
+{
+    const int file = ::open(path.constData(), O_RDONLY | O_CLOEXEC);
+    if (file < 0)
+        return SystemResult::of(errno);
+    const SystemResult flushed = resultOf(::fdatasync(file));
+    ::close(file);
+    return flushed;
+}
+
+SystemResult readChecksum(const QByteArray& path, quint32& checksum)
+{
+    RandomAccessFile file;
+    const SystemResult opened = file.open(path.constData());
+    if (opened.bad())
+        return opened;
+    QByteArray block(kBlock, Qt::Uninitialized);
+    quint32 found = 0;
+    qint64 at = 0;
+    for (qint64 count = kBlock; count > 0; at += count) {
+        count = file.readAt(at, block.data(), kBlock);
+        if (count < 0)
+            return SystemResult::of(errno);
+        found = libdeflate_crc32(found, block.constData(), static_cast<std::size_t>(count));
+    }
+    checksum = found;
+    return {};
 }
 
 qint64 freeSpace(const QByteArray& path)

@@ -28,6 +28,9 @@ public:
     /// What was written is on the disk from here on, and nothing more is written.
     SystemResult flush();
 
+    /// Changes the name under which it waits. Over what has that name it is put.
+    SystemResult rename(const QByteArray& path);
+
     /// Gives it a second name in the same file system, over which nothing is put: EEXIST where there is a file.
     SystemResult linkTo(const QByteArray& path) const;
 
@@ -37,11 +40,15 @@ public:
     const QByteArray& path() const { return mPath; }
     qint64 size() const { return mSize; }
 
+    /// Of what was written (CRC-32).
+    quint32 checksum() const { return mChecksum; }
+
 private:
     void close();
 
     QByteArray mPath;
     qint64 mSize = 0;
+    quint32 mChecksum = 0;
     int mDescriptor = -1;
     bool mIsKept = false;
 };
@@ -51,6 +58,12 @@ SystemResult makeLastingFolder(const QByteArray& path);
 
 /// The names in a folder are on the disk from here on.
 SystemResult flushFolder(const QByteArray& path);
+
+/// What is in a file is on the disk from here on.
+SystemResult flushFile(const QByteArray& path);
+
+/// The checksum of a file (CRC-32).
+SystemResult readChecksum(const QByteArray& path, quint32& checksum);
 
 /// What is left for files of this user [bytes]; -1 when it cannot be told.
 qint64 freeSpace(const QByteArray& path);

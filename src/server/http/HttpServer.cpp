@@ -31,7 +31,8 @@ struct HttpServer::Private
 {
     Private(const HttpSettings& settings, Handler& handler, ExchangeObserver& observer)
         : workers(settings.workers)
-        , host{settings, handler, observer, workers}
+        , receivers(settings.receivers)
+        , host{settings, handler, observer, workers, receivers}
     {
         for (int i = 0; i < settings.ioThreads; ++i)
             threads.push_back(std::make_unique<SessionThread>());
@@ -48,6 +49,7 @@ struct HttpServer::Private
 
     std::vector<std::unique_ptr<SessionThread>> threads;
     WorkerThreads workers;
+    WorkerThreads receivers;
     SessionHost host;
     std::shared_ptr<TlsContext> tls;  // null without TLS; atomic, for it may be renewed
     std::unique_ptr<Listener> listener;

@@ -16,8 +16,9 @@ struct HttpSettings
     QByteArray keyFile;       ///< PEM
     QByteArray clientCaFile;  ///< PEM, by which clients may show who they are; empty: they are not asked to
 
-    int workers = 8;          ///< threads that answer
-    int ioThreads = 2;        ///< threads that wait for sockets
+    int workers = 8;     ///< threads that answer
+    int receivers = 16;  ///< threads that take bodies: they mostly wait for disks, and that best together
+    int ioThreads = 2;   ///< threads that wait for sockets
     int connections = 10000;  ///< at a time; further ones get 503
     int requests = 256;       ///< that are answered or wait for a thread; further ones get 503
 

@@ -20,6 +20,7 @@ struct SessionHost
     Handler& handler;
     ExchangeObserver& observer;
     WorkerThreads& workers;
+    WorkerThreads& receivers;
     std::atomic<bool> stops{false};
     std::atomic<int> answering{0};  ///< requests that are answered or wait for that
     std::atomic<int> inFlight{0};   ///< requests whose answers are not sent whole
@@ -66,6 +67,7 @@ private:
     void answerAtOnce(Response response, Afterwards afterwards);
     void answer();
     void beginBody(Response response);
+    void receiveOn();
     void receiveBody();
     void takeBody();
     void awaitBody();

@@ -51,11 +51,20 @@ void Session::beginBody(Response response)
         endBody(std::move(response), Afterwards::Close);
         return;
     }
-    if (mSink == nullptr)
-        mSink = std::make_unique<LetGo>(std::move(response), mHost.settings.bodyBytes);
     mBodyBegan = Clock::now();
     mBodyBytes = 0;
+    if (mSink != nullptr) {
+        receiveOn();
+        return;
+    }
+    mSink = std::make_unique<LetGo>(std::move(response), mHost.settings.bodyBytes);
     receiveBody();
+}
+
+/// Who waits for a disk keeps nobody waiting who only wants an answer.
+void Session::receiveOn()
+{
+    mHost.receivers.run([self = shared_from_this()] { self->receiveBody(); });
 }
 
 void Session::receiveBody()
@@ -68,7 +77,7 @@ void Session::receiveBody()
     }
 }
 
-/// On a worker, for the sink may wait for disks. Nothing is read from the client before the sink has taken what was there.
+/// On a receiver, for the sink may wait for disks. Nothing is read from the client before the sink has taken what was there.
 void Session::takeBody()
 {
     QByteArray block(kBodyBlock, Qt::Uninitialized);
@@ -109,7 +118,7 @@ void Session::takeBody()
             return;
         }
     }
-    mHost.workers.run([self = shared_from_this()] { self->receiveBody(); });
+    receiveOn();
 }
 
 /// Back on the thread of the I/O.
@@ -127,7 +136,7 @@ void Session::awaitBody()
                               self->expire();
                           } else if (waited == Connection::Waited::Ready) {
                               self->mIsWithWorker = true;
-                              self->mHost.workers.run([self] { self->receiveBody(); });
+                              self->receiveOn();
                           }
                       });
 }

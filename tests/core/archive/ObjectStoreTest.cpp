@@ -14,6 +14,7 @@
 #include <QDirIterator>
 
 #include <gtest/gtest.h>
+#include <libdeflate.h>
 
 #include <thread>
 
@@ -203,7 +204,7 @@ TEST_F(ObjectStoreTest, LeavesAloneWhatAnotherProcessCompletes)
 
 TEST_F(ObjectStoreTest, TakesInOrRemovesWhatAServerLeftThatDied)
 {
-    // One is half received, one has its place and is not registered, one is registered.
+    // One is half received, one is registered.
     EXPECT_EQ(inChild([&] {
                   ArrivedStudies studies;
                   const auto objects = open(studies);
@@ -218,18 +219,33 @@ TEST_F(ObjectStoreTest, TakesInOrRemovesWhatAServerLeftThatDied)
     const QString staging = filesBelow("objects/.incoming").filter(QStringLiteral("/life")).value(0).left(32);
     const QString left = mFolder.filePath("objects/.incoming/") + staging;
     const QString series = mFolder.filePath("objects/1.2/1.2.3/");
-    putFile(left + QStringLiteral("/77"), fileOf(anImage("1.2.3.2")));
-    ASSERT_EQ(::link((left + QStringLiteral("/77")).toUtf8().constData(),
-                     (series + QStringLiteral("1.2.3.2.dcm")).toUtf8().constData()),
-              0);
-    ASSERT_EQ(::link((series + QStringLiteral("1.2.3.1.dcm")).toUtf8().constData(),
-                     (left + QStringLiteral("/78")).toUtf8().constData()),
-              0);
+    // The others have a place, and were registered or not.
+    const auto leave = [&](const char* image, const char* place, const QByteArray& bytes,
+                           const QByteArray& whole) {
+        static int sNumber = 70;
+        const auto checksum = libdeflate_crc32(0, whole.constData(), static_cast<std::size_t>(whole.size()));
+        const QString name = left + QStringLiteral("/%1=%2=1.2=1.2.3=%3")
+                                        .arg(++sNumber)
+                                        .arg(checksum, 0, 16)
+                                        .arg(QLatin1String(image));
+        const QByteArray staged = name.toUtf8();
+        const QByteArray placed = (series + QLatin1String(place)).toUtf8();
+        if (!bytes.isNull())
+            putFile(name, bytes);
+        EXPECT_EQ(bytes.isNull() ? ::link(placed.constData(), staged.constData())
+                                 : ::link(staged.constData(), placed.constData()),
+                  0);
+    };
+    const QByteArray whole = fileOf(anImage("1.2.3.2"));
+    leave("1.2.3.1", "1.2.3.1.dcm", {}, whole);
+    leave("1.2.3.2", "1.2.3.2.dcm", whole, whole);
     // Something newer of its UID came while it lay there.
-    putFile(left + QStringLiteral("/79"), fileOf(anImage("1.2.3.1").with(DCM_PatientName, "Older")));
-    ASSERT_EQ(::link((left + QStringLiteral("/79")).toUtf8().constData(),
-                     (series + QStringLiteral("1.2.3.1_0002.dcm")).toUtf8().constData()),
-              0);
+    const QByteArray older = fileOf(anImage("1.2.3.1").with(DCM_PatientName, "Older"));
+    leave("1.2.3.1", "1.2.3.1_0002.dcm", older, older);
+    // The power went before its bytes were on the disk: it has its length, and none of them, or not all.
+    leave("1.2.3.3", "1.2.3.3.dcm", QByteArray(whole.size(), '\0'), whole);
+    leave("1.2.3.4", "1.2.3.4.dcm", QByteArray(whole).replace(whole.size() - 8, 8, QByteArray(8, '\0')),
+          whole);
 
     ArrivedStudies studies;
     const auto database = catalogue();
@@ -237,8 +253,8 @@ TEST_F(ObjectStoreTest, TakesInOrRemovesWhatAServerLeftThatDied)
     const auto arriving = objects->begin();
     ASSERT_TRUE(objects->recover(*database).good());
     EXPECT_FALSE(QDir(left).exists());
-    EXPECT_EQ(filesBelow("objects/1.2"),
-              (QStringList{QStringLiteral("1.2.3/1.2.3.1.dcm"), QStringLiteral("1.2.3/1.2.3.2.dcm")}));
+    EXPECT_EQ(filesBelow("objects/1.2").join(QLatin1Char(' ')).toStdString(),
+              "1.2.3/1.2.3.1.dcm 1.2.3/1.2.3.2.dcm");
     Kxg::StudyContents contents;
     ASSERT_TRUE(database->studyContents("1.2", contents).good());
     EXPECT_EQ(contents.images.size(), 2U);

@@ -4,8 +4,6 @@
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/os/FileStatus.h"
 
-#include <QCryptographicHash>
-
 #include <dcmtk/dcmdata/dcdeftag.h>
 
 #include <cerrno>
@@ -36,6 +34,16 @@ QByteArray nameOf(const QByteArray& sopUID, int version)
                         : sopUID + '_' + QByteArray::number(version).rightJustified(4, '0') + ".dcm";
 }
 
+/// Neither UIDs nor numbers have it in them.
+constexpr char kSeparator = '=';
+
+QByteArray stagedName(const StagedFile& file, const ArrivedObject& object)
+{
+    const QList<QByteArray> parts = {file.path(), QByteArray::number(file.checksum(), 16), object.studyUID,
+                                     object.seriesUID, object.image};
+    return parts.join(kSeparator);
+}
+
 }  // namespace
 
 void refuse(ArrivedObject& object, ArrivalFault fault, const QString& reason)
@@ -49,14 +57,6 @@ ArrivalFault faultOf(const SystemResult& result)
     const int error = result.error();
     return error == ENOSPC || error == EDQUOT || error == EFBIG ? ArrivalFault::OutOfSpace
                                                                 : ArrivalFault::Failed;
-}
-
-QByteArray ObjectPlaces::lockOf(const ArrivedObject& object) const
-{
-    const QByteArray digest =
-        QCryptographicHash::hash(object.studyUID + ' ' + object.image, QCryptographicHash::Md5).toHex();
-    // So many that two objects seldom meet, and so few that nobody has to remove them.
-    return locks() + '/' + digest.left(2);
 }
 
 bool ObjectPlaces::check(DicomInput& input, const QByteArray& studyUID, ArrivedObject& object)
@@ -128,10 +128,12 @@ QByteArray ObjectPlaces::folderOf(const ArrivedObject& object) const
     return mRules.folder + '/' + object.studyUID + '/' + object.seriesUID;
 }
 
-bool ObjectPlaces::place(const StagedFile& file, DicomInput& input, ArrivedObject& object) const
+bool ObjectPlaces::place(StagedFile& file, DicomInput& input, ArrivedObject& object) const
 {
     const QByteArray folder = folderOf(object);
     SystemResult placed = makeLastingFolder(folder);
+    if (placed.good())
+        placed = file.rename(stagedName(file, object));
     for (int version = 1; placed.good() && version <= kMostVersions; ++version) {
         const QByteArray path = folder + '/' + nameOf(object.image, version);
         placed = file.linkTo(path);
@@ -152,6 +154,17 @@ bool ObjectPlaces::place(const StagedFile& file, DicomInput& input, ArrivedObjec
     else
         refuse(object, faultOf(placed), placed.text());
     return false;
+}
+
+bool ObjectPlaces::readStagedName(const QByteArray& path, ArrivedObject& object, quint32& checksum)
+{
+    const QList<QByteArray> parts = path.mid(path.lastIndexOf('/') + 1).split(kSeparator);
+    bool isNumber = false;
+    checksum = parts.value(1).toUInt(&isNumber, 16);
+    object.studyUID = parts.value(2);
+    object.seriesUID = parts.value(3);
+    object.image = parts.value(4);
+    return isNumber && isName(object.studyUID) && isName(object.seriesUID) && isName(object.image);
 }
 
 QByteArray ObjectPlaces::placeOf(const QByteArray& path, const ArrivedObject& object) const

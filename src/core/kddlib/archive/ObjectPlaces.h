@@ -27,8 +27,9 @@ public:
     QByteArray staging() const { return mRules.folder + "/.incoming"; }
     QByteArray locks() const { return staging() + "/locks"; }
 
-    /// The file that stands for the right to decide about the object, and others.
-    QByteArray lockOf(const ArrivedObject& object) const;
+    /// By these, and the object's name there, goes the right to decide about it.
+    QByteArray objectLocks() const { return locks() + "/objects"; }
+    static QByteArray lockName(const ArrivedObject& object) { return object.studyUID + ' ' + object.image; }
 
     /// Reads the object at the input's path.
     static bool check(DicomInput& input, const QByteArray& studyUID, ArrivedObject& object);
@@ -39,8 +40,12 @@ public:
     QByteArray folderOf(const ArrivedObject& object) const;
 
     /// Gives the file its place, or finds the place that it has already: a server died before it registered it, or it was
-    /// removed from the archive, which leaves files where they are. The input's path is that place afterwards.
-    bool place(const StagedFile& file, DicomInput& input, ArrivedObject& object) const;
+    /// removed from the archive, which leaves files where they are. The input's path is that place afterwards. Before, the
+    /// file's first name tells what `readStagedName` reads: its bytes need not be on the disk yet.
+    bool place(StagedFile& file, DicomInput& input, ArrivedObject& object) const;
+
+    /// Of a file that may have got a place: the object's UIDs, and the checksum that it has when all of it is there.
+    static bool readStagedName(const QByteArray& path, ArrivedObject& object, quint32& checksum);
 
     /// Which place of the object is another name of the file at `path`; empty when none is.
     QByteArray placeOf(const QByteArray& path, const ArrivedObject& object) const;

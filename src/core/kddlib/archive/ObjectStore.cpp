@@ -3,14 +3,16 @@
 #include "kddlib/archive/ArrivedStudies.h"
 #include "kddlib/archive/DicomInput.h"
 #include "kddlib/archive/FileWalk.h"
+#include "kddlib/archive/ObjectBatch.h"
 #include "kddlib/archive/ObjectPlaces.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
+#include "platform/os/FlushThreads.h"
+#include "platform/os/NamedLocks.h"
 #include "platform/os/PathName.h"
 #include "platform/os/StagedFile.h"
 
 #include <QDir>
-#include <QSet>
 #include <QUuid>
 
 #include <unistd.h>
@@ -18,7 +20,6 @@
 #include <algorithm>
 #include <atomic>
 #include <cerrno>
-#include <map>
 
 namespace Kdd
 {
@@ -28,6 +29,9 @@ namespace
 
 /// How much may come before the disk is looked at again [bytes].
 constexpr qint64 kRoomStep = 16 * 1024 * 1024;
+
+/// Waits for the disk at a time. They take nothing but the disk's time, of which many at once take hardly more than one.
+constexpr int kFlushThreads = 16;
 
 }  // namespace
 
@@ -97,6 +101,7 @@ struct ObjectStore::Private
     Result makeStaging();
     Result recover(const QByteArray& folder, Kxg::Catalogue& catalogue);
     Result recoverFile(const QByteArray& path, Kxg::Catalogue& catalogue);
+    Result takeIn(const QByteArray& place, Kxg::Catalogue& catalogue);
 
     ArrivedStudies& studies;
     const ObjectRules rules;
@@ -104,6 +109,7 @@ struct ObjectStore::Private
     QByteArray staging;  // of this process alone
     LockFile life;       // by which others know that it still lives
     std::atomic<quint64> count{0};
+    FlushThreads flushes{kFlushThreads};
 };
 
 Result ObjectStore::Private::makeStaging()
@@ -168,141 +174,13 @@ std::unique_ptr<ObjectArrival> ObjectStore::begin()
     return std::unique_ptr<ObjectArrival>(new ObjectArrival(std::move(made)));
 }
 
-// ---- what has come whole
-
-/// Objects on their way into the archive: what costs a wait for the disk or the database is done for all of them at once.
-class ObjectStore::Batch
-{
-public:
-    Batch(Private& store, Kxg::Catalogue& catalogue)
-        : mStore(store)
-        , mCatalogue(catalogue)
-    {
-    }
-
-    /// Reads, checks and flushes each.
-    void prepare(std::vector<std::unique_ptr<ObjectArrival>>& arrivals, const QByteArray& studyUID);
-    void store();
-    std::vector<ArrivedObject> take();
-
-private:
-    struct Entry
-    {
-        StagedFile* file = nullptr;
-        DicomInput input;
-        ArrivedObject object;
-    };
-
-    bool lock(Entry& entry);
-    void finish();
-
-    Private& mStore;
-    Kxg::Catalogue& mCatalogue;
-    std::vector<Entry> mEntries;
-    std::vector<Entry*> mPlaced;  // and not registered yet
-    std::map<QByteArray, LockFile> mLocks;
-};
-
-void ObjectStore::Batch::prepare(std::vector<std::unique_ptr<ObjectArrival>>& arrivals,
-                                 const QByteArray& studyUID)
-{
-    for (const auto& arrival : arrivals) {
-        ObjectArrival::Private& received = *arrival->d;
-        Entry entry;
-        entry.file = &received.file;
-        entry.input.path = received.file.path();
-        if (received.fault != ArrivalFault::None)
-            refuse(entry.object, received.fault, received.reason);
-        else
-            ObjectPlaces::check(entry.input, studyUID, entry.object);
-        mEntries.push_back(std::move(entry));
-    }
-    // Apart from the reading: while the first one is waited for the others are written too.
-    for (Entry& entry : mEntries) {
-        const SystemResult flushed = entry.object.isStored() ? entry.file->flush() : SystemResult();
-        if (flushed.bad())
-            refuse(entry.object, faultOf(flushed), flushed.text());
-    }
-}
-
-/// The right to decide about the object. Nobody waits for it while he has others, or two would wait for each other.
-bool ObjectStore::Batch::lock(Entry& entry)
-{
-    const QByteArray path = mStore.places.lockOf(entry.object);
-    // One that is sent twice is decided about twice.
-    const bool isThere = std::any_of(mPlaced.begin(), mPlaced.end(), [&](const Entry* placed) {
-        return placed->object.studyUID == entry.object.studyUID && placed->object.image == entry.object.image;
-    });
-    if (mLocks.count(path) > 0 && !isThere)
-        return true;
-    if (isThere || mLocks[path].acquire(path, LockFile::IfHeld::Fail).bad()) {
-        mLocks.erase(path);
-        finish();
-        const SystemResult waited = mLocks[path].acquire(path, LockFile::IfHeld::Wait);
-        if (waited.bad())
-            refuse(entry.object, ArrivalFault::Failed, waited.text());
-    }
-    return entry.object.isStored();
-}
-
-void ObjectStore::Batch::store()
-{
-    for (Entry& entry : mEntries) {
-        if (entry.object.isStored() && lock(entry) &&
-            mStore.places.settleWithKnown(entry.input, mCatalogue, entry.object) &&
-            mStore.places.place(*entry.file, entry.input, entry.object))
-            mPlaced.push_back(&entry);
-    }
-    finish();
-}
-
-/// Registers what has its place, and lets go of the rights.
-void ObjectStore::Batch::finish()
-{
-    Result result;
-    QSet<QByteArray> folders;
-    for (const Entry* entry : mPlaced)
-        folders.insert(mStore.places.folderOf(entry->object));
-    for (const QByteArray& folder : qAsConst(folders))
-        result = result.good() ? Result(flushFolder(folder)) : result;
-    std::vector<DicomInput> images;
-    std::vector<QByteArray> paths;
-    for (Entry* entry : mPlaced) {
-        paths.push_back(entry->input.path);
-        images.push_back(std::move(entry->input));
-    }
-    if (result.good() && !images.empty())
-        result = mStore.studies.add(std::move(images), mCatalogue);
-    for (std::size_t i = 0; i < mPlaced.size(); ++i) {
-        ArrivedObject& object = mPlaced[i]->object;
-        if (result.good()) {
-            ObjectPlaces::tellShown(paths[i], mCatalogue, object);
-            continue;
-        }
-        // It may be registered all the same, when the answer was lost: the file stays, and so does its first name, from
-        // which it is known what to do with it.
-        mPlaced[i]->file->keep();
-        refuse(object, ArrivalFault::Failed, result.text());
-    }
-    mPlaced.clear();
-    mLocks.clear();
-}
-
-std::vector<ArrivedObject> ObjectStore::Batch::take()
-{
-    std::vector<ArrivedObject> objects;
-    for (Entry& entry : mEntries)
-        objects.push_back(std::move(entry.object));
-    return objects;
-}
-
 std::vector<ArrivedObject> ObjectStore::commit(std::vector<std::unique_ptr<ObjectArrival>>& arrivals,
                                                Kxg::Catalogue& catalogue, const QByteArray& studyUID)
 {
-    Batch batch(*d, catalogue);
-    batch.prepare(arrivals, studyUID);
-    batch.store();
-    return batch.take();
+    ObjectBatch batch(d->places, d->studies, d->flushes, catalogue, studyUID);
+    for (const auto& arrival : arrivals)
+        batch.add(arrival->d->file, arrival->d->fault, arrival->d->reason);
+    return batch.finish();
 }
 
 // ---- what was left
@@ -331,7 +209,7 @@ Result ObjectStore::Private::recover(const QByteArray& folder, Kxg::Catalogue& c
     Result result;
     for (const QString& name : QDir(pathText(folder)).entryList(QDir::Files)) {
         const QByteArray path = folder + '/' + pathBytes(name);
-        // Without a second name it was never whole.
+        // Without a second name it was never whole, or nobody needs the first one.
         if (result.good() && linkCount(path) > 1)
             result = recoverFile(path, catalogue);
     }
@@ -342,13 +220,14 @@ Result ObjectStore::Private::recover(const QByteArray& folder, Kxg::Catalogue& c
 Result ObjectStore::Private::recoverFile(const QByteArray& path, Kxg::Catalogue& catalogue)
 {
     ArrivedObject object;
-    DicomInput input;
-    LockFile turn;
-    input.path = path;
-    if (!ObjectPlaces::check(input, {}, object))
-        return {};
+    quint32 checksum = 0;
+    NamedLocks turn;
     QVector<Kxg::KeptFile> files;
-    Result result = turn.acquire(places.lockOf(object), LockFile::IfHeld::Wait);
+    if (!ObjectPlaces::readStagedName(path, object, checksum))
+        return {};
+    Result result = turn.open(places.objectLocks());
+    if (result.good())
+        result = turn.acquire(ObjectPlaces::lockName(object), NamedLocks::IfHeld::Wait);
     if (result.good())
         result = catalogue.imageFiles(object.studyUID, object.image, files);
     const QByteArray place = places.placeOf(path, object);
@@ -356,13 +235,24 @@ Result ObjectStore::Private::recoverFile(const QByteArray& path, Kxg::Catalogue&
                                           [&](const Kxg::KeptFile& file) { return file.path == place; });
     if (result.bad() || place.isEmpty() || isRegistered)
         return result;
-    if (!files.isEmpty())
+    quint32 found = 0;
+    if (!files.isEmpty() || readChecksum(path, found).bad() || found != checksum)
         return SystemResult::of(::unlink(place.constData()) == 0 ? 0 : errno);
+    return takeIn(place, catalogue);
+}
+
+/// It may only be whole in memory yet.
+Result ObjectStore::Private::takeIn(const QByteArray& place, Kxg::Catalogue& catalogue)
+{
+    Result result = flushFile(place);
+    if (result.good())
+        result = flushFolder(place.left(place.lastIndexOf('/')));
+    std::vector<DicomInput> images;
+    images.push_back(readDicomInput(place, Damage::Refused));
+    if (result.bad() || images[0].kind != DicomInput::Kind::Image)
+        return result;
     LogFile::warnf("%s was stored by a server that ended before it told so; it is taken in now",
                    place.constData());
-    input.path = place;
-    std::vector<DicomInput> images;
-    images.push_back(std::move(input));
     return studies.add(std::move(images), catalogue);
 }
 

@@ -113,7 +113,7 @@ public:
 
     /// Stores objects that have come whole, what costs a wait for disk or database for all of them at once, and tells of each
     /// what became of it. With `studyUID` not empty they have to be of that study. In this order: headers are read and
-    /// checked, the files are flushed and get their places, they are registered.
+    /// checked, the files get their places, all of that is flushed, they are registered.
     std::vector<ArrivedObject> commit(std::vector<std::unique_ptr<ObjectArrival>>& arrivals,
                                       Kxg::Catalogue& catalogue, const QByteArray& studyUID = {});
 
@@ -121,7 +121,6 @@ public:
     Result recover(Kxg::Catalogue& catalogue);
 
 private:
-    class KDD_LOCAL Batch;
     struct KDD_LOCAL Private;
     explicit ObjectStore(std::unique_ptr<Private> made);
     std::unique_ptr<Private> d;

@@ -1,0 +1,172 @@
+#!/usr/bin/env python3
+"""How fast objects arrive by STOW-RS: kdd serve beside Orthanc with its DICOMweb plugin, in turn, over loopback.
+
+    bench/arrivals.py BUILD-FOLDER [IMAGES] [CONNECTIONS,...] [OBJECTS-PER-REQUEST,...]
+
+A CT of 1,000 images of 512 x 512, a study of its own for each row, is sent over 1, 4 and 8 connections, one object in a
+request and 20. Told are objects per second, from the first byte to the last answer; the time from there until the
+study's count is right in a search and its metadata has all images; the server's processor time for each object, until
+then; and how many objects were not told as stored. Above the rows stands what one wait for the disk costs here, before
+and after: a server that tells of nothing before it is on the disk cannot be faster than its waits.
+"""
+import gzip
+import http.client
+import json
+import os
+import shutil
+import socket
+import statistics
+import sys
+import tempfile
+import threading
+import time
+
+from servers import ImageTemplate, ct_slices, start_kdd, start_peer
+
+SIDE = 512  # rows and columns
+BOUNDARY = b"a-boundary-of-the-benchmark"
+PART = b"\r\n--" + BOUNDARY + b"\r\nContent-Type: application/dicom\r\n\r\n"
+END = b"\r\n--" + BOUNDARY + b"--\r\n"
+PATIENCE = 300  # until a study counts as never complete [s]
+
+
+class Sender(threading.Thread):
+    """Sends requests, which it takes from a list that others take from too, over one connection."""
+
+    def __init__(self, server, requests, begin):
+        super().__init__()
+        self.server, self.requests, self.begin, self.stored, self.fault = server, requests, begin, 0, None
+
+    def run(self):
+        try:
+            link = socket.create_connection(("127.0.0.1", self.server.port))
+            link.setsockopt(socket.IPPROTO_TCP, socket.TCP_NODELAY, 1)
+            self.begin.wait()
+            while True:
+                try:
+                    objects = self.requests.pop()
+                except IndexError:
+                    return
+                self.send(link, objects)
+        except Exception as fault:
+            self.fault = fault
+
+    def send(self, link, objects):
+        pieces = [piece for object in objects for piece in (PART, *object)] + [END]
+        head = (b"POST %s/studies HTTP/1.1\r\nHost: 127.0.0.1:%d\r\nAccept: application/dicom+json\r\n"
+                b'Content-Type: multipart/related; type="application/dicom"; boundary=%s\r\nContent-Length: %d\r\n\r\n'
+                % (self.server.prefix.encode(), self.server.port, BOUNDARY, sum(len(each) for each in pieces)))
+        link.sendall(head)
+        for piece in pieces:
+            link.sendall(piece)
+        answer = http.client.HTTPResponse(link, method="POST")
+        answer.begin()
+        told = json.loads(answer.read())
+        self.stored += len(told.get("00081199", {}).get("Value", []))
+
+
+def ask(server, path):
+    link = http.client.HTTPConnection("127.0.0.1", server.port, timeout=PATIENCE)
+    link.request("GET", server.prefix + path, headers={"Accept": "application/dicom+json", "Accept-Encoding": "gzip"})
+    answer = link.getresponse()
+    body = answer.read()
+    if answer.status != 200:
+        return []
+    if answer.getheader("Content-Encoding") == "gzip":
+        body = gzip.decompress(body)
+    return json.loads(body)
+
+
+def await_complete(server, study, count):
+    """Seconds until a search tells the count, and until the metadata has it."""
+    begin, counted = time.monotonic(), None
+    while time.monotonic() - begin < PATIENCE:
+        if counted is None:
+            found = ask(server, "/studies?includefield=00201208&StudyInstanceUID=" + study)
+            if found and [int(each) for each in found[0].get("00201208", {}).get("Value", [])] == [count]:
+                counted = time.monotonic() - begin
+        if counted is not None and len(ask(server, "/studies/%s/metadata" % study)) == count:
+            return counted, time.monotonic() - begin
+        time.sleep(0.02)
+    return counted or float("inf"), float("inf")
+
+
+def measure(server, row, count, connections, batch, template):
+    study = template.study(row)
+    pixels = memoryview(template.pixels)  # which all share
+    objects = [(template.head_of(row, 1, number), pixels) for number in range(count)]
+    requests = [objects[at:at + batch] for at in range(0, count, batch)][::-1]
+    begin = threading.Barrier(connections + 1)
+    senders = [Sender(server, requests, begin) for _ in range(connections)]
+    for sender in senders:
+        sender.start()
+    cpu = server.cpu()
+    begin.wait()
+    start = time.monotonic()
+    for sender in senders:
+        sender.join()
+    wall = time.monotonic() - start
+    faults = [sender.fault for sender in senders if sender.fault]
+    if faults:
+        raise faults[0]
+    counted, whole = await_complete(server, study, count)
+    return {"rate": count / wall, "counted": counted, "whole": whole, "cpu": (server.cpu() - cpu) / count * 1000,
+            "missing": count - sum(sender.stored for sender in senders)}
+
+
+def disk_wait(folder):
+    """Milliseconds until half a MiB in a new file is on the disk."""
+    times = []
+    for _ in range(20):
+        path = os.path.join(folder, "probe")
+        with open(path, "wb", buffering=0) as file:
+            file.write(bytes(512 * 1024))
+            start = time.monotonic()
+            os.fdatasync(file.fileno())
+            times.append(time.monotonic() - start)
+        os.unlink(path)
+    return statistics.median(times) * 1000
+
+
+def numbers(at, default):
+    return [int(each) for each in sys.argv[at].split(",")] if len(sys.argv) > at else default
+
+
+def main():
+    if len(sys.argv) < 2:
+        sys.exit(__doc__)
+    kdd = os.path.abspath(os.path.join(sys.argv[1], "src/tools/kdd/kdd"))
+    count = numbers(2, [1000])[0]
+    folder = tempfile.mkdtemp(prefix="kdd-arrivals-", dir=os.environ.get("KDD_BENCH_FOLDER"))
+    servers = []
+    try:
+        template = ImageTemplate(ct_slices(kdd, folder)[0], SIDE)
+        servers.append(start_kdd(kdd, folder, options=["--stow"], env={"KDD_FREE_SPACE": "0"}))
+        peer = start_peer(folder)
+        if peer:
+            servers.append(peer)
+        print("One wait for the disk: %.1f ms" % disk_wait(folder))
+        head = "| connections | objects a request | server | objects/s | ratio | counted s | metadata s | CPU ms | not stored |"
+        print(head + "\n|" + "---|" * head.count(" | ") + "---|")
+        row = 0
+        for batch in numbers(4, [1, 20]):
+            for connections in numbers(3, [1, 4, 8]):
+                first = None
+                row += 1
+                for server in servers:
+                    found = measure(server, row, count, connections, batch, template)
+                    first = first or found
+                    print("| %d | %d | %s | %.0f | %s | %.2f | %.2f | %.2f | %d |" % (
+                        connections, batch, server.name, found["rate"],
+                        "" if found is first else "%.1f" % (first["rate"] / found["rate"]),
+                        found["counted"], found["whole"], found["cpu"], found["missing"]), flush=True)
+        print("One wait for the disk: %.1f ms" % disk_wait(folder))
+        print("Largest memory, MiB: " + ", ".join("%s %.0f" % (each.name, each.memory()) for each in servers))
+    finally:
+        for server in servers:
+            server.stop()
+        shutil.rmtree(folder)
+
+
+if __name__ == "__main__":
+    main()

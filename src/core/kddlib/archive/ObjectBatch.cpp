@@ -1,0 +1,140 @@
+#include "kddlib/archive/ObjectBatch.h"
+
+#include "kddlib/archive/ArrivedStudies.h"
+#include "kddlib/tagmodel/TagMap.h"
+
+#include <unistd.h>
+
+#include <algorithm>
+#include <map>
+#include <utility>
+
+namespace Kdd
+{
+
+ObjectBatch::ObjectBatch(const ObjectPlaces& places, ArrivedStudies& studies, FlushThreads& flushes,
+                         Kxg::Catalogue& catalogue, QByteArray studyUID)
+    : mPlaces(places)
+    , mStudies(studies)
+    , mFlushes(flushes)
+    , mCatalogue(catalogue)
+    , mStudyUID(std::move(studyUID))
+    , mCanLock(mLocks.open(places.objectLocks()))
+{
+}
+
+void ObjectBatch::add(StagedFile& file, ArrivalFault fault, const QString& reason)
+{
+    mEntries.emplace_back();
+    Entry& entry = mEntries.back();
+    entry.file = &file;
+    entry.input.path = file.path();
+    if (fault != ArrivalFault::None) {
+        refuse(entry.object, fault, reason);
+        return;
+    }
+    if (ObjectPlaces::check(entry.input, mStudyUID, entry.object) && lock(entry) &&
+        mPlaces.settleWithKnown(entry.input, mCatalogue, entry.object) &&
+        mPlaces.place(file, entry.input, entry.object))
+        beginFlush(entry);
+}
+
+/// The right to decide about the object. Nobody waits for it while he has others, or two would wait for each other.
+bool ObjectBatch::lock(Entry& entry)
+{
+    const QByteArray name = ObjectPlaces::lockName(entry.object);
+    // One that is sent twice is decided about twice.
+    const bool isThere = std::any_of(mPlaced.begin(), mPlaced.end(), [&](const Entry* placed) {
+        return ObjectPlaces::lockName(placed->object) == name;
+    });
+    SystemResult locked = mCanLock;
+    if (locked.good() && (isThere || mLocks.acquire(name, NamedLocks::IfHeld::Fail).bad())) {
+        settle();
+        locked = mLocks.acquire(name, NamedLocks::IfHeld::Wait);
+    }
+    if (locked.bad())
+        refuse(entry.object, ArrivalFault::Failed, locked.text());
+    return locked.good();
+}
+
+/// Of a file that lay there already nobody knows whether it ever was waited for.
+void ObjectBatch::beginFlush(Entry& entry)
+{
+    mPlaced.push_back(&entry);
+    entry.flushed = mFlushes.begin([&entry] {
+        const bool isOwn = isSameFile(entry.file->path(), entry.input.path);
+        return isOwn ? entry.file->flush() : flushFile(entry.input.path);
+    });
+}
+
+std::vector<ArrivedObject> ObjectBatch::finish()
+{
+    settle();
+    std::vector<ArrivedObject> objects;
+    for (Entry& entry : mEntries)
+        objects.push_back(std::move(entry.object));
+    return objects;
+}
+
+/// Registers what has its place, and lets go of the rights.
+void ObjectBatch::settle()
+{
+    registerPlaced(awaitFlushes());
+    mPlaced.clear();
+    if (mCanLock.good())
+        mLocks.release();
+}
+
+/// Files and the folders that name them are waited for together. A file that cannot be written is refused; failure: a folder
+/// cannot be.
+Result ObjectBatch::awaitFlushes()
+{
+    std::map<QByteArray, std::future<SystemResult>> folders;
+    for (const Entry* entry : mPlaced) {
+        const QByteArray folder = mPlaces.folderOf(entry->object);
+        if (folders.count(folder) == 0)
+            folders[folder] = mFlushes.begin([folder] { return flushFolder(folder); });
+    }
+    Result result;
+    for (auto& folder : folders) {
+        const SystemResult flushed = folder.second.get();
+        result = result.good() ? Result(flushed) : result;
+    }
+    const auto isFlushed = [](Entry* entry) {
+        const SystemResult flushed = entry->flushed.get();
+        if (flushed.good())
+            return true;
+        if (isSameFile(entry->file->path(), entry->input.path))
+            ::unlink(entry->input.path.constData());
+        refuse(entry->object, faultOf(flushed), flushed.text());
+        return false;
+    };
+    // All are asked, for what they wait with belongs to this object.
+    mPlaced.erase(std::stable_partition(mPlaced.begin(), mPlaced.end(), isFlushed), mPlaced.end());
+    return result;
+}
+
+void ObjectBatch::registerPlaced(Result result)
+{
+    std::vector<DicomInput> images;
+    std::vector<QByteArray> paths;
+    for (Entry* entry : mPlaced) {
+        paths.push_back(entry->input.path);
+        images.push_back(std::move(entry->input));
+    }
+    if (result.good() && !images.empty())
+        result = mStudies.add(std::move(images), mCatalogue);
+    for (std::size_t i = 0; i < mPlaced.size(); ++i) {
+        ArrivedObject& object = mPlaced[i]->object;
+        if (result.good()) {
+            ObjectPlaces::tellShown(paths[i], mCatalogue, object);
+            continue;
+        }
+        // It may be registered all the same, when the answer was lost: the file stays, and so does its first name, from
+        // which it is known what to do with it.
+        mPlaced[i]->file->keep();
+        refuse(object, ArrivalFault::Failed, result.text());
+    }
+}
+
+}  // namespace Kdd
