@@ -48,7 +48,7 @@ void checkSearch(const QVector<Http::Field>& query, const char* resource)
     require(plan.onStudy.size() + plan.onSeries.size() + plan.onImages.size() <= all.size(),
             "no condition is made up");
     for (const Http::Field& field : query)
-        holdAll(all, OneValue(QString::fromUtf8(field.value)), request.zone);
+        holdAll(all, OneValue(QString::fromUtf8(field.value)), request);
 }
 
 }  // namespace
