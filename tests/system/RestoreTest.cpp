@@ -21,12 +21,12 @@ class Restore : public ServedStore, public testing::WithParamInterface<Restored>
 protected:
     void store(const std::vector<int>& images) const
     {
-        quint16 port = 0;
-        const auto server = serve(port);
+        Addresses addresses;
+        const auto server = serve(addresses);
         for (const int number : images) {
             const QByteArray uid = "1.2.3." + QByteArray::number(number);
             save(uid.constData(), anImage(uid.constData()).with(DCM_PatientName, "Doe^J"));
-            EXPECT_EQ(send(port, bytes(uid.constData())), 200);
+            EXPECT_EQ(send(addresses, bytes(uid.constData())), 200);
         }
         server->terminate();
         EXPECT_EQ(finish(*server).exitCode, 0);

@@ -6,24 +6,30 @@
 namespace Kdd
 {
 
-/// A store that takes objects over HTTP, by servers in processes of their own.
+/// A store that takes objects over HTTP and associations, by servers in processes of their own.
 class ServedStore : public CommandLine
 {
 protected:
-    std::unique_ptr<QProcess> serve(quint16& port) const
+    struct Addresses
     {
-        auto process = start("--json serve --stow --listen 127.0.0.1:0");
+        QByteArray http;
+        QByteArray dicom;
+    };
+
+    std::unique_ptr<QProcess> serve(Addresses& addresses) const
+    {
+        auto process = start("--json serve --stow --listen 127.0.0.1:0 --dicom 0");
         EXPECT_TRUE(process->waitForReadyRead(kTimeout)) << process->readAllStandardError().toStdString();
-        const QString address =
-            QJsonDocument::fromJson(process->readLine()).object().value(QLatin1String("address")).toString();
-        port = address.mid(address.lastIndexOf(QLatin1Char(':')) + 1).toUShort();
+        const QJsonObject told = QJsonDocument::fromJson(process->readLine()).object();
+        addresses.http = told.value(QLatin1String("address")).toString().toLatin1();
+        addresses.dicom = told.value(QLatin1String("dicom")).toString().toLatin1();
         return process;
     }
 
     /// The status; 0 when the server went before it told one.
-    static int send(quint16 port, const QByteArray& object)
+    static int send(const Addresses& addresses, const QByteArray& object)
     {
-        Client client("http://127.0.0.1:" + QByteArray::number(port));
+        Client client(addresses.http);
         if (!client.isConnected())
             return 0;
         client.send("POST /dicom-web/studies HTTP/1.1\r\nHost: localhost\r\nConnection: close\r\n"
