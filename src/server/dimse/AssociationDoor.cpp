@@ -20,6 +20,46 @@ constexpr int kNoListening = 1;
 
 constexpr int kTimeout = 30;  // [s]; of waits that PeerConnection ends on its own terms
 
+/// What DCMTK has of a connection: it deletes it as soon as it takes it for closed.
+class Handle : public DcmTransportConnection
+{
+public:
+    explicit Handle(PeerConnection& connection)
+        : DcmTransportConnection(connection.socket())
+        , mConnection(connection)
+    {
+    }
+    ~Handle() override { mConnection.close(); }
+
+    OFCondition serverSideHandshake() override { return EC_Normal; }
+    OFCondition clientSideHandshake() override { return EC_IllegalCall; }
+    OFCondition renegotiate(const char* /*newSuite*/) override { return EC_IllegalCall; }
+    ssize_t read(void* to, size_t size) override
+    {
+        return mConnection.read(static_cast<char*>(to), static_cast<qint64>(size));
+    }
+    ssize_t write(void* from, size_t size) override
+    {
+        // No interruption, after which DCMTK would come again.
+        errno = EPIPE;
+        const bool isWritten = mConnection.write(static_cast<const char*>(from), static_cast<qint64>(size));
+        return isWritten ? static_cast<ssize_t>(size) : -1;
+    }
+    void close() override { mConnection.close(); }
+    void closeTransportConnection() override { mConnection.close(); }
+    unsigned long getPeerCertificateLength() override { return 0; }
+    unsigned long getPeerCertificate(void* /*to*/, unsigned long /*size*/) override { return 0; }
+    OFBool networkDataAvailable(int timeout) override
+    {
+        return mConnection.hasData(std::chrono::seconds(std::max(timeout, 0)));
+    }
+    OFBool isTransparentConnection() override { return OFFalse; }
+    OFString& dumpConnectionParameters(OFString& text) override { return text; }
+
+private:
+    PeerConnection& mConnection;
+};
+
 }  // namespace
 
 void EndAssociation::operator()(T_ASC_Association* association) const
@@ -37,7 +77,7 @@ public:
         return waiting.release();
     }
 
-    std::unique_ptr<PeerConnection> waiting;
+    std::unique_ptr<Handle> waiting;
 };
 
 std::unique_ptr<AssociationDoor> AssociationDoor::open(Result& result)
@@ -62,13 +102,12 @@ AssociationDoor::~AssociationDoor()
         ASC_dropNetwork(&mNetwork);
 }
 
-DcmtkAssociation AssociationDoor::enter(std::unique_ptr<PeerConnection> connection, int socket,
-                                        quint32 pduSize)
+DcmtkAssociation AssociationDoor::enter(PeerConnection& connection, quint32 pduSize)
 {
     T_ASC_Association* association = nullptr;
     const std::lock_guard<std::mutex> lock(sTurn);
-    mLayer->waiting = std::move(connection);
-    dcmExternalSocketHandle.set(socket);
+    mLayer->waiting = std::make_unique<Handle>(connection);
+    dcmExternalSocketHandle.set(connection.socket());
     const OFCondition received = ASC_receiveAssociation(mNetwork, &association, static_cast<long>(pduSize));
     dcmExternalSocketHandle.set(-1);
     mLayer->waiting.reset();

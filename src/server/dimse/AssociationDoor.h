@@ -28,9 +28,8 @@ public:
     static std::unique_ptr<AssociationDoor> open(Result& result);
     ~AssociationDoor();
 
-    /// An association that waits for its answer; null when the request cannot be understood. The connection is the
-    /// association's then, and gone otherwise. `socket` is the connection's.
-    DcmtkAssociation enter(std::unique_ptr<PeerConnection> connection, int socket, quint32 pduSize);
+    /// An association that waits for its answer; null when the request cannot be understood. The connection outlives it.
+    DcmtkAssociation enter(PeerConnection& connection, quint32 pduSize);
 
 private:
     class Layer;

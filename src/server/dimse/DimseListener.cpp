@@ -113,6 +113,8 @@ struct DimseListener::Private
     bool acceptOne();
     void serve(std::list<Worker>::iterator worker, int socket, const QByteArray& peer);
     void associate(std::list<Worker>::iterator worker, int socket, const QByteArray& peer);
+    bool isTrusted(const PeerConnection& connection, const QByteArray& peer) const;
+    void answer(PeerConnection& connection, const QByteArray& peer);
     void reap();
     void breakOff(bool alsoAssociations);
 
@@ -244,32 +246,36 @@ void DimseListener::Private::associate(std::list<Worker>::iterator worker, int t
     std::unique_ptr<Http::Transport> transport = std::make_unique<Http::PlainTransport>(taken);
     if (tls != nullptr)
         transport = tls->accept(taken);
-    auto owned = std::make_unique<PeerConnection>(taken, std::move(transport), stopped.number(),
-                                                  settings.patience, PduLimits());
-    PeerConnection& connection = *owned;
-    const auto show = [&](PeerConnection* breakable, bool isAssociation = false) {
+    PeerConnection connection(taken, std::move(transport), stopped.number(), settings.patience, PduLimits());
+    const auto show = [&](PeerConnection* breakable, bool isAssociation) {
         const std::lock_guard<std::mutex> lock(mutex);
         worker->connection = breakable;
         worker->isAssociation = isAssociation;
     };
-    show(&connection);
+    show(&connection, false);
+    if (connection.receiveRequest() && isTrusted(connection, peer)) {
+        show(&connection, true);
+        answer(connection, peer);
+    }
+    show(nullptr, false);
+}
+
+bool DimseListener::Private::isTrusted(const PeerConnection& connection, const QByteArray& peer) const
+{
+    if (tls == nullptr || !settings.tls->needsCertificate || !connection.certificate().isEmpty())
+        return true;
+    LogFile::warnf("A connection from %s is closed: it showed no certificate", peer.constData());
+    return false;
+}
+
+void DimseListener::Private::answer(PeerConnection& connection, const QByteArray& peer)
+{
+    DcmtkAssociation made = door->enter(connection, PduLimits().pdu);
+    if (made == nullptr)
+        return;
     Caller caller;
     caller.address = peer;
-    DcmtkAssociation made;
-    if (connection.receiveRequest()) {
-        caller.certificate = connection.certificate();
-        if (tls != nullptr && settings.tls->needsCertificate && caller.certificate.isEmpty())
-            LogFile::warnf("A connection from %s is closed: it showed no certificate", peer.constData());
-        else {
-            show(nullptr);
-            made = door->enter(std::move(owned), taken, PduLimits().pdu);
-        }
-    }
-    if (made == nullptr) {
-        show(nullptr);
-        return;
-    }
-    show(&connection, true);
+    caller.certificate = connection.certificate();
     const bool hasRoom = ++associations <= settings.associations;
     {
         Association association(std::move(made), connection, caller, settings, providers, observer, ++count);
@@ -277,7 +283,6 @@ void DimseListener::Private::associate(std::list<Worker>::iterator worker, int t
             association.run();
         else
             association.rejectForNow();
-        show(nullptr);
     }
     --associations;
 }

@@ -42,8 +42,7 @@ int millisecondsTo(PeerConnection::Clock::time_point end)
 
 PeerConnection::PeerConnection(int socket, std::unique_ptr<Http::Transport> transport, int stop,
                                std::chrono::seconds patience, const PduLimits& limits)
-    : DcmTransportConnection(socket)
-    , mSocket(socket)
+    : mSocket(socket)
     , mStop(stop)
     , mPatience(patience)
     , mTransport(std::move(transport))
@@ -103,10 +102,10 @@ bool PeerConnection::receive(QByteArray& bytes, int size)
     const int begin = bytes.size();
     bytes.resize(begin + size);
     for (int got = 0; got < size;) {
-        const ssize_t count = readSome(bytes.data() + begin + got, size - got);
-        if (count <= 0)
+        const int count = readSome(bytes.data() + begin + got, size - got);
+        if (count == 0)
             return false;
-        got += static_cast<int>(count);
+        got += count;
     }
     return true;
 }
@@ -134,7 +133,8 @@ bool PeerConnection::receiveRequest()
     return true;
 }
 
-ssize_t PeerConnection::readSome(char* to, int size)
+/// 0: there is no more, for whatever reason.
+int PeerConnection::readSome(char* to, int size)
 {
     while (mIsOpen && !mIsBroken) {
         int count = 0;
@@ -143,66 +143,57 @@ ssize_t PeerConnection::readSome(char* to, int size)
             mBytes += count;
             return count;
         }
-        if (outcome == Outcome::Ended)
+        if (outcome == Outcome::Ended || outcome == Outcome::Failed ||
+            !wait(outcome == Outcome::WantsRead ? POLLIN : POLLOUT, end()))
             return 0;
-        if (outcome == Outcome::Failed || !wait(outcome == Outcome::WantsRead ? POLLIN : POLLOUT, end()))
-            return -1;
     }
-    return -1;
+    return 0;
 }
 
-ssize_t PeerConnection::read(void* to, size_t size)
+qint64 PeerConnection::read(char* to, qint64 size)
 {
-    const int most = static_cast<int>(std::min<size_t>(size, 1 << 20));
+    const int most = static_cast<int>(std::min<qint64>(size, 1 << 20));
     if (mRequestRead < mRequest.size()) {
         const int count = std::min(most, mRequest.size() - mRequestRead);
-        std::memcpy(to, mRequest.constData() + mRequestRead, static_cast<size_t>(count));
+        std::memcpy(to, mRequest.constData() + mRequestRead, static_cast<std::size_t>(count));
         mRequestRead += count;
         return count;
     }
-    errno = 0;
-    const ssize_t count = readSome(static_cast<char*>(to), most);
-    if (count > 0 && !mGuard.take(static_cast<const char*>(to), count)) {
-        sendAbort(kByProvider, kInvalidValue);
-        close();
-        return 0;
-    }
-    // An interruption would have the caller come again.
-    return count < 0 ? 0 : count;
+    const int count = readSome(to, most);
+    if (count == 0 || mGuard.take(to, count))
+        return count;
+    sendAbort(kByProvider, kInvalidValue);
+    close();
+    return 0;
 }
 
-ssize_t PeerConnection::write(void* from, size_t size)
+bool PeerConnection::write(const char* from, qint64 size)
 {
     const Clock::time_point until = Clock::now() + mPatience;
-    const char* bytes = static_cast<const char*>(from);
-    auto left = static_cast<qint64>(size);
-    while (left > 0) {
+    while (size > 0) {
         qint64 count = 0;
         const Outcome outcome = mIsOpen && !mIsBroken
-                                    ? mTransport->write(bytes, left, Http::Transport::More::No, count)
+                                    ? mTransport->write(from, size, Http::Transport::More::No, count)
                                     : Outcome::Failed;
         if (outcome == Outcome::Done) {
-            bytes += count;
-            left -= count;
+            from += count;
+            size -= count;
         } else if (outcome == Outcome::Ended || outcome == Outcome::Failed ||
                    !wait(outcome == Outcome::WantsRead ? POLLIN : POLLOUT, until)) {
-            errno = EPIPE;
-            return -1;
+            return false;
         }
     }
-    return static_cast<ssize_t>(size);
+    return true;
 }
 
-OFBool PeerConnection::networkDataAvailable(int timeout)
+bool PeerConnection::hasData(std::chrono::seconds time)
 {
-    if (mRequestRead < mRequest.size() || mTransport->hasUnread())
-        return OFTrue;
-    return wait(POLLIN, Clock::now() + std::chrono::seconds(std::max(timeout, 0)));
+    return mRequestRead < mRequest.size() || mTransport->hasUnread() || wait(POLLIN, Clock::now() + time);
 }
 
 void PeerConnection::sendAbort(unsigned char source, unsigned char reason)
 {
-    char abort[] = {7, 0, 0, 0, 0, 4, 0, 0, static_cast<char>(source), static_cast<char>(reason)};
+    const char abort[] = {7, 0, 0, 0, 0, 4, 0, 0, static_cast<char>(source), static_cast<char>(reason)};
     write(abort, sizeof abort);
 }
 
@@ -217,21 +208,6 @@ void PeerConnection::breakOff()
 {
     mIsBroken = true;
     ::shutdown(mSocket, SHUT_RDWR);
-}
-
-OFCondition PeerConnection::renegotiate(const char* /*newSuite*/)
-{
-    return EC_IllegalCall;
-}
-
-unsigned long PeerConnection::getPeerCertificate(void* /*to*/, unsigned long /*size*/)
-{
-    return 0;
-}
-
-OFString& PeerConnection::dumpConnectionParameters(OFString& text)
-{
-    return text;
 }
 
 }  // namespace Kdd::Dimse

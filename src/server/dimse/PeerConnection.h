@@ -17,9 +17,9 @@
 namespace Kdd::Dimse
 {
 
-/// The connection of one association, as DCMTK reads and writes it: plain or over TLS, with an end to every wait, and without
-/// what PduGuard refuses. Used by one thread at a time but for `breakOff`.
-class PeerConnection : public DcmTransportConnection
+/// The connection of one association: plain or over TLS, with an end to every wait, and without what PduGuard refuses. Used by
+/// one thread at a time but for `breakOff`.
+class PeerConnection
 {
 public:
     using Clock = std::chrono::steady_clock;
@@ -29,7 +29,9 @@ public:
     /// Takes the socket, which does not block. `stop` is a descriptor that can be read from when the server stops.
     PeerConnection(int socket, std::unique_ptr<Http::Transport> transport, int stop,
                    std::chrono::seconds patience, const PduLimits& limits);
-    ~PeerConnection() override;
+    ~PeerConnection();
+    PeerConnection(const PeerConnection&) = delete;
+    PeerConnection& operator=(const PeerConnection&) = delete;
 
     /// Whom the certificate names that the other side showed.
     QByteArray certificate() const { return mTransport->peerName(); }
@@ -53,24 +55,24 @@ public:
     /// Ends every wait from now on. On any thread.
     void breakOff();
 
-    OFCondition serverSideHandshake() override { return EC_Normal; }
-    OFCondition clientSideHandshake() override { return EC_IllegalCall; }
-    OFCondition renegotiate(const char* newSuite) override;
-    ssize_t read(void* to, size_t size) override;
-    ssize_t write(void* from, size_t size) override;
-    void close() override;
-    void closeTransportConnection() override { close(); }
-    unsigned long getPeerCertificateLength() override { return 0; }
-    unsigned long getPeerCertificate(void* to, unsigned long size) override;
-    OFBool networkDataAvailable(int timeout) override;
-    OFBool isTransparentConnection() override { return OFFalse; }
-    OFString& dumpConnectionParameters(OFString& text) override;
+    /// Up to so many bytes; 0 when there will be no more.
+    qint64 read(char* to, qint64 size);
+
+    /// All of them. False: the other side takes no more.
+    bool write(const char* from, qint64 size);
+
+    /// Whether something can be read, after `time` at the latest.
+    bool hasData(std::chrono::seconds time);
+
+    void close();
+
+    int socket() const { return mSocket; }
 
 private:
     using Outcome = Http::Transport::Outcome;
 
     bool receive(QByteArray& bytes, int size);
-    ssize_t readSome(char* to, int size);
+    int readSome(char* to, int size);
     bool wait(short events, Clock::time_point end) const;
     Clock::time_point end() const;
 
