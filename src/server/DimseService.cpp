@@ -47,10 +47,10 @@ std::unique_ptr<DimseService> DimseService::make(const Dimse::DimseSettings& set
     result = checkReach(settings.address, isDecided);
     std::unique_ptr<DimseService> made(new DimseService(audit));
     if (result.good())
-        result = made->mLog.check();
-    if (result.good())
         made->mListener =
             Dimse::DimseListener::make(settings, makeProviders(archive, settings), made->mLog, result);
+    if (result.good())
+        result = made->mLog.check();
     return result.good() ? std::move(made) : nullptr;
 }
 

@@ -95,16 +95,18 @@ TEST_F(Blocks, InXmlAreJobsAndInIniAreSettings)
     }
 }
 
-TEST_F(Blocks, InJsonAreAccessFiles)
+TEST_F(Blocks, InJsonAreAccessFilesOrPeersFiles)
 {
     for (const Block& block : blocksIn("json")) {
         putBeside("access.json", block.text.toUtf8());
         // It would run for ever with a certificate.
+        const bool isPeers = block.place().find("dimse.md") != std::string::npos;
         const Answer answer =
-            shell({QStringLiteral("KDD_SERVER_LISTEN=127.0.0.1:0 kdd serve --access access.json "
-                                  "--tls-cert none.pem --tls-key none.pem")});
+            shell({isPeers ? QStringLiteral("kdd receive 0 --peers access.json")
+                           : QStringLiteral("KDD_SERVER_LISTEN=127.0.0.1:0 kdd serve --access access.json "
+                                            "--tls-cert none.pem --tls-key none.pem")});
         EXPECT_EQ(answer.exitCode, 1) << block.place() << answer.err.toStdString();
-        EXPECT_TRUE(answer.err.contains("none.pem")) << answer.err.toStdString();
+        EXPECT_TRUE(answer.err.contains(isPeers ? "tls.pem" : "none.pem")) << answer.err.toStdString();
     }
 }
 

@@ -68,7 +68,9 @@ QString SampleArchive::substituted(QString text) const
     for (const auto& [there, here] : kStandIns)
         text.replace(QLatin1String(there), here);
     // A server is asked to end as soon as it has begun. Its port may be taken here.
-    text.replace(QRegularExpression(QStringLiteral("^(kdd serve[^#]*)(#.*)?$")),
+    text.replace(QRegularExpression(QStringLiteral("^(kdd (?:serve|receive).*) 11112")),
+                 QStringLiteral("\\1 0"));
+    text.replace(QRegularExpression(QStringLiteral("^(kdd (?:serve|receive)[^#]*)(#.*)?$")),
                  QStringLiteral("rm -f served; mkfifo served; KDD_SERVER_LISTEN=127.0.0.1:0 \\1 >served &\n"
                                 "read -r line <served; kill $!; wait $!"));
     // The door builds and tests everything, this test included: here it only has to know the word.

@@ -21,6 +21,23 @@ TEST_F(Serve, TellsItsAddressesAndEndsWhenItIsAsked)
     EXPECT_EQ(finish(*process).exitCode, 0);
 }
 
+TEST_F(Serve, ReceivesWithoutRequestsWhenThatIsAskedFor)
+{
+    const auto process = start("--json receive 127.0.0.1:0");
+    ASSERT_TRUE(process->waitForReadyRead(kTimeout)) << process->readAllStandardError().toStdString();
+    const QString address =
+        QJsonDocument::fromJson(process->readLine()).object().value(QLatin1String("dicom")).toString();
+    save("1", anImage("1"));
+    QProcess sender;
+    sender.start(QStringLiteral("storescu"),
+                 {QStringLiteral("-aec"), QStringLiteral("KDD"), QStringLiteral("127.0.0.1"),
+                  address.mid(address.lastIndexOf(QLatin1Char(':')) + 1), file("1")});
+    EXPECT_EQ(finish(sender).exitCode, 0);
+    process->terminate();
+    EXPECT_EQ(finish(*process).exitCode, 0);
+    EXPECT_EQ(imagesOf("1.2"), 1) << "it is in the tag file when the server has ended";
+}
+
 TEST_F(Serve, SaysWhyItDoesNotBegin)
 {
     const struct
@@ -37,6 +54,10 @@ TEST_F(Serve, SaysWhyItDoesNotBegin)
         {"serve --listen 127.0.0.1:0 --viewer none", 1, "none: there is no viewer"},
         {"serve --listen 127.0.0.1:0 --public images", 1, "images is no public address"},
         {"serve --listen 127.0.0.1:0 --host a/b", 1, "a/b is no name of a host"},
+        {"serve --listen 127.0.0.1:0 --dicom x", 2, "\"x\" is no address for associations"},
+        {"serve --listen 127.0.0.1:0 --dicom 0.0.0.0:0", 1, "0.0.0.0:0 can be reached by other machines"},
+        {"receive 0 --title SEVENTEEN-LETTERS", 2, "\"SEVENTEEN-LETTERS\" is no application entity title"},
+        {"receive 0 --peers none.json", 2, "The peers file cannot be followed: none.json: "},
     };
     for (const auto& refusal : kRefusals) {
         const Answer answer = kdd(refusal.arguments);

@@ -1,7 +1,9 @@
 #include "CommandLineFixture.h"
+#include "server/dimse/RawCaller.h"
 #include "server/http/Client.h"
 
 #include <QDirIterator>
+#include <QtEndian>
 
 #include <random>
 #include <set>
@@ -28,13 +30,19 @@ protected:
         return bytes(name.constData());
     }
 
-    std::unique_ptr<QProcess> serve(quint16& port) const
+    struct Addresses
     {
-        auto process = start("--json serve --stow --listen 127.0.0.1:0");
+        QByteArray http;
+        QByteArray dicom;
+    };
+
+    std::unique_ptr<QProcess> serve(Addresses& addresses) const
+    {
+        auto process = start("--json serve --stow --listen 127.0.0.1:0 --dicom 0");
         EXPECT_TRUE(process->waitForReadyRead(kTimeout)) << process->readAllStandardError().toStdString();
-        const QString address =
-            QJsonDocument::fromJson(process->readLine()).object().value(QLatin1String("address")).toString();
-        port = address.mid(address.lastIndexOf(QLatin1Char(':')) + 1).toUShort();
+        const QJsonObject told = QJsonDocument::fromJson(process->readLine()).object();
+        addresses.http = told.value(QLatin1String("address")).toString().toLatin1();
+        addresses.dicom = told.value(QLatin1String("dicom")).toString().toLatin1();
         return process;
     }
 
@@ -46,10 +54,23 @@ protected:
         return files.hasNext() ? fileContent(files.next()) : QByteArray("(no tag file)");
     }
 
-    /// The status; 0 when the server went before it told one.
-    static int send(quint16 port, const QByteArray& object)
+    /// Over an association; whether it was told as stored. One that the server did not live to tell about is not.
+    static bool sendTo(const QByteArray& address, const QByteArray& object, const QByteArray& uid)
     {
-        Client client("http://127.0.0.1:" + QByteArray::number(port));
+        RawCaller caller(address);
+        if (caller.associate({{UID_SecondaryCaptureImageStorage, {UID_LittleEndianExplicitTransferSyntax}}})
+                .isEmpty())
+            return false;
+        const int meta = qFromLittleEndian<qint32>(object.constData() + 140);
+        const int status = caller.store(UID_SecondaryCaptureImageStorage, uid, object.mid(144 + meta));
+        EXPECT_TRUE(status == 0 || status == -1) << status;
+        return status == 0;
+    }
+
+    /// The status; 0 when the server went before it told one.
+    static int send(const QByteArray& address, const QByteArray& object)
+    {
+        Client client(address);
         if (!client.isConnected())
             return 0;
         client.send("POST /dicom-web/studies HTTP/1.1\r\nHost: localhost\r\nConnection: close\r\n"
@@ -73,19 +94,22 @@ TEST_F(Store, LosesNothingThatItToldWasStoredWhenItIsKilled)
         // Some of the round before come again.
         for (int i = 0; i < kPerRound; ++i)
             objects.push_back(objectOf(round * kPerRound * 2 / 3 + i));
-        quint16 port = 0;
-        const auto server = serve(port);
+        Addresses addresses;
+        const auto server = serve(addresses);
         std::vector<std::thread> senders;
-        for (int sender = 0; sender < 3; ++sender) {
+        for (int sender = 0; sender < 4; ++sender) {
             senders.emplace_back([&, sender] {
-                for (int i = sender; i < kPerRound; i += 3) {
-                    const int status = send(port, objects[static_cast<std::size_t>(i)]);
-                    const std::lock_guard<std::mutex> lock(mutex);
+                for (int i = sender; i < kPerRound; i += 4) {
+                    const QByteArray& object = objects[static_cast<std::size_t>(i)];
                     const QByteArray uid = uidOf(round * kPerRound * 2 / 3 + i);
-                    sent.insert(uid);
-                    if (status == 200)
-                        stored.insert(uid);
+                    const bool isByRequest = sender % 2 == 0;
+                    const int status = isByRequest ? send(addresses.http, object) : 0;
                     EXPECT_TRUE(status == 200 || status == 0) << status;
+                    const bool isStored = isByRequest ? status == 200 : sendTo(addresses.dicom, object, uid);
+                    const std::lock_guard<std::mutex> lock(mutex);
+                    sent.insert(uid);
+                    if (isStored)
+                        stored.insert(uid);
                 }
             });
         }

@@ -2,8 +2,6 @@
 
 #include "server/dimse/SinkStream.h"
 
-#include <QElapsedTimer>
-
 #include <dcmtk/dcmdata/dcistrmb.h>
 #include <dcmtk/dcmdata/dctk.h>
 #include <dcmtk/dcmnet/cond.h>

@@ -46,7 +46,8 @@ RawCaller::RawCaller(const QByteArray& address)
     there.sin_port = htons(address.mid(address.lastIndexOf(':') + 1).toUShort());
     const timeval time = {kPatience, 0};
     ::setsockopt(mSocket, SOL_SOCKET, SO_RCVTIMEO, &time, sizeof time);
-    EXPECT_EQ(::connect(mSocket, reinterpret_cast<const sockaddr*>(&there), sizeof there), 0);
+    // One that fails is seen by what does not come.
+    static_cast<void>(::connect(mSocket, reinterpret_cast<const sockaddr*>(&there), sizeof there));
 }
 
 RawCaller::~RawCaller()
