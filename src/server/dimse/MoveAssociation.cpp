@@ -215,7 +215,7 @@ Result MoveAssociation::request(const Parties& parties, const std::vector<Propos
         return result;
     }
     mIsBroken = true;
-    condition = ASC_requestAssociation(mNetwork, parameters, &mAssociation);
+    condition = ASC_requestAssociation(mNetwork, parameters, &mAssociation, nullptr, nullptr, DUL_NOBLOCK, seconds);
     if (condition.good()) {
         mIsBroken = false;
         return {};

@@ -155,7 +155,7 @@ QByteArray storedSyntaxOf(const TagMap& image)
         return {};
     const int number = static_cast<unsigned char>(element->value().at(0));
     const char* uid =
-        number <= EXS_RLELossless ? DcmXfer(static_cast<E_TransferSyntax>(number)).getXferID() : nullptr;
+        number <= EXS_PrivateGE_LEI_WithBigEndianPixelData ? DcmXfer(static_cast<E_TransferSyntax>(number)).getXferID() : nullptr;
     return uid;
 }
 

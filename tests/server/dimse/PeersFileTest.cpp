@@ -34,6 +34,8 @@ TEST(PeersFileTest, IsRefusedForEverySlipWithItsPlace)
         {R"({"anyone": ["store"], "tls": {"certificate": "a"}})", "tls.key is no text"},
         {R"({"anyone": ["store"], "tls": {"certificate": "a", "key": "b", "required": true}})",
          "tls.caFile is needed"},
+        {R"({"peers": {"WS1": {"rights": ["query"], "host": "ws1", "port": 104, "tls": true}}})",
+         "tls.caFile is needed"},
         {R"({"anyone": ["store"], "unknownClasses": 1})", "unknownClasses is neither true nor false"},
     };
     for (const auto& slip : kSlips) {

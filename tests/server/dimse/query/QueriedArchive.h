@@ -77,6 +77,7 @@ protected:
                   << QString::fromLatin1(dicom.mid(dicom.lastIndexOf(':') + 1));
         arguments += files;
         auto process = std::make_unique<QProcess>();
+        process->setWorkingDirectory(mAnswers);
         process->setProcessChannelMode(QProcess::MergedChannels);
         process->start(QLatin1String(tool), arguments);
         return process;

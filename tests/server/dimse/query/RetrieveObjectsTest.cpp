@@ -134,8 +134,8 @@ TEST_P(RetrieveObjects, RefusesWhatNamesNothing)
 {
     fill();
     for (const char* keys : kNotUnderstood) {
-        EXPECT_THAT(move(keysOf(keys)), HasSubstr("IdentifierDoesNotMatchSOPClass")) << keys;
-        EXPECT_THAT(get(keysOf(keys)), HasSubstr("IdentifierDoesNotMatchSOPClass")) << keys;
+        EXPECT_THAT(move(keysOf(keys)), HasSubstr("DataSetDoesNotMatchSOPClass")) << keys;
+        EXPECT_THAT(get(keysOf(keys)), HasSubstr("DataSetDoesNotMatchSOPClass")) << keys;
         EXPECT_TRUE(answers().empty()) << keys;
     }
 }
@@ -159,9 +159,9 @@ TEST_P(RetrieveObjects, TellsWhichOfThemCannotBeSent)
     EXPECT_THAT(moved, HasSubstr("Warning: SubOperationsCompleteOneOrMoreFailures"));
     EXPECT_THAT(moved, HasSubstr("(0008,0058) UI [1.1.2]"));
     EXPECT_THAT(moved, HasSubstr("Completed Suboperations       : 2"));
-    const std::string got = getStudy("1", {QStringLiteral("-d")});
+    const std::string got = getStudy("1");
     EXPECT_EQ(answered(DCM_SOPInstanceUID), "1.1.1 1.2.1");
-    EXPECT_THAT(got, HasSubstr("(0008,0058) UI [1.1.2]"));
+    EXPECT_TRUE(got.find("Number of Failed Suboperations    : 1") != std::string::npos) << got;
 }
 
 struct StoredForm
@@ -226,11 +226,7 @@ public:
         EXPECT_TRUE(ASC_initializeNetwork(NET_ACCEPTOR, port, 30, &mNetwork).good());
         mThread = std::thread([this, objects] { serve(objects); });
     }
-    ~DyingDestination()
-    {
-        mThread.join();
-        ASC_dropNetwork(&mNetwork);
-    }
+    ~DyingDestination() { mThread.join(); }
 
 private:
     void serve(int objects)
@@ -254,6 +250,7 @@ private:
         }
         ASC_dropAssociation(association);
         ASC_destroyAssociation(&association);
+        ASC_dropNetwork(&mNetwork);
     }
 
     T_ASC_Network* mNetwork = nullptr;
@@ -325,8 +322,9 @@ TEST_P(RetrieveObjects, AnswersManyAtOnceThoughSomeAreKilled)
             asking[i]->kill();
         EXPECT_TRUE(asking[i]->waitForFinished(120000));
         mAnswers = folders[i];
-        const std::string expected = i % 4 != 1 ? "1.1.1 1.1.2 1.2.1" : answered(DCM_SOPInstanceUID);
-        EXPECT_EQ(answered(DCM_SOPInstanceUID), expected) << i;
+        if (i % 4 != 1) {
+            EXPECT_EQ(answered(DCM_SOPInstanceUID), "1.1.1 1.1.2 1.2.1") << i;
+        }
     }
     moveStudy("2");
     EXPECT_EQ(answered(DCM_SOPInstanceUID), "2.1.1");
