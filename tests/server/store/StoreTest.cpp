@@ -153,6 +153,27 @@ TEST_F(StoreTest, WhatIsToldStoredIsFoundAndRetrievedAtOnce)
     EXPECT_EQ(filesBelowObjects(), 5);
 }
 
+TEST_F(StoreTest, WhatOneServerStoredAnotherOneFindsAtOnce)
+{
+    start();
+    std::unique_ptr<Server> other = std::move(mServer);
+    start();
+    for (int i = 1; i <= 6; ++i) {
+        other.swap(mServer);
+        const QByteArray uid = "1.2.3." + QByteArray::number(i);
+        ASSERT_EQ(store(anImage(uid.constData())).status, 200);
+        other.swap(mServer);
+        const QByteArray image = "/studies/1.2/series/1.2.3/instances/" + uid;
+        // Each way of asking, with nothing asked before that would have brought it in.
+        if (i % 3 == 0)
+            EXPECT_EQ(get(image).status, 200);
+        else if (i % 3 == 1)
+            EXPECT_EQ(get(image + "/metadata").status, 200);
+        else
+            EXPECT_EQ(instances("1.2"), i);
+    }
+}
+
 TEST_F(StoreTest, TellsOfEachPartWhatBecameOfIt)
 {
     start();

@@ -63,26 +63,37 @@ Http::Response MetadataResource::answer(const Http::Request& request, const Reso
     if (!metadata.read(request, path, status, reason))
         return Http::failure(status, reason);
 
-    if (mStudies.arrivals() != nullptr)
-        mStudies.arrivals()->bringInOwn(path.study);
+    Arrivals* const arrivals = mStudies.arrivals();
+    if (arrivals != nullptr)
+        arrivals->bringInOwn(path.study);
+    Http::Response response = look(request, metadata);
+    // What is asked for may have arrived at another server a moment ago.
+    if (response.status == 404 && arrivals != nullptr && arrivals->bringIn(path.study))
+        response = look(request, metadata);
+    return response;
+}
+
+Http::Response MetadataResource::look(const Http::Request& request, const MetadataRequest& metadata)
+{
     // The version alone answers whoever has the answer already or gets one that is kept: both exist only of what was
     // there in this version.
     QByteArray version;
     std::shared_ptr<const ServedStudy> study;
-    Presence presence = mStudies.version(path.study, version, study);
+    Presence presence = mStudies.version(metadata.path.study, version, study);
     if (presence != Presence::Found)
         return notThere(presence);
     const QByteArray tag = entityTag(metadata, version);
     if (Http::hasEntity(request, tag, Http::AnyTag::DoesNotCount))
         return Http::notModified(tag, kVary);
     Http::FileRange kept;
-    if (metadata.takesGzip && path.instance.isEmpty() && mKept.find(nameOf(metadata, version), kept)) {
+    if (metadata.takesGzip && metadata.path.instance.isEmpty() &&
+        mKept.find(nameOf(metadata, version), kept)) {
         Http::Response response = found(tag, metadata);
         response.body.emplace_back(std::move(kept));
         return response;
     }
     if (study == nullptr)
-        presence = mStudies.find(path.study, study);
+        presence = mStudies.find(metadata.path.study, study);
     return presence == Presence::Found ? answerFrom(std::move(study), request, metadata) : notThere(presence);
 }
 

@@ -69,8 +69,10 @@ Http::Response SearchResource::answer(const Http::Request& request, const Resour
 
     // Studies that have just come are known at once, but not what they consist of.
     const bool isBelowStudies = search.level == SearchLevel::Series || search.level == SearchLevel::Instances;
-    if (isBelowStudies && mShelf.arrivals() != nullptr)
-        mShelf.arrivals()->bringInOwn(path.study);
+    if (isBelowStudies && mShelf.arrivals() != nullptr && path.study.isEmpty())
+        mShelf.arrivals()->bringInOwn({});
+    else if (isBelowStudies && mShelf.arrivals() != nullptr)
+        mShelf.arrivals()->bringIn(path.study);
 
     const QByteArray root = request.base;
     Http::Response response;

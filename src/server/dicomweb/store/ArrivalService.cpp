@@ -106,7 +106,11 @@ bool ArrivalService::bringIn(const QByteArray& studyUID)
     // Asked in any case: another server may have taken it.
     const Result result = mDatabase.ask([&](Kxg::Catalogue& catalogue) {
         QVector<QByteArray> waiting;
-        const Result asked = catalogue.waitingStudies(folder, waiting);
+        QVector<qint64> arrived;
+        Result asked = catalogue.additions(studyUID, arrived);
+        // Others may wait too, of which some thousand files were registered that nobody waits for.
+        if (asked.good() && !arrived.isEmpty())
+            asked = catalogue.waitingStudies(folder, waiting);
         if (waiting.contains(studyUID) && !mStudies.isWaiting(studyUID))
             mStudies.addWaiting(studyUID);
         return asked;
