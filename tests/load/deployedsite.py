@@ -114,10 +114,19 @@ class DeployedSite:
         kind, number = name[:-1], int(name[-1])
         (self.start_server if kind == "server" else self.start_worker)(number)
 
+    def signalled(self, name, how, clients):
+        """False when it is a server and clients count on it."""
+        with clients.mutex:
+            if name.startswith("server") and clients.repeating > 0:
+                return False
+            self.processes[name].send_signal(how)
+            return True
+
     def end(self, name, how=signal.SIGTERM):
-        """Its exit code."""
+        """Its exit code, after the signal; None: it was given one."""
         process = self.processes.pop(name)
-        process.send_signal(how)
+        if how is not None:
+            process.send_signal(how)
         return process.wait(120)
 
     def tag_files(self, store=None):
