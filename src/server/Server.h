@@ -2,6 +2,7 @@
 
 #include "server/access/AccessRules.h"
 #include "server/access/AddressGuard.h"
+#include "server/dicomweb/change/ChangeRules.h"
 #include "server/dicomweb/store/StoreBody.h"
 #include "server/dimse/DimseSettings.h"
 #include "server/http/HttpSettings.h"
@@ -32,6 +33,7 @@ struct ServerSettings
         false;              ///< that somebody decided who may have associations; else only this machine may
     QByteArray dimseAudit;  ///< as DimseLog has it
     DicomWeb::StoreLimits store;
+    DicomWeb::ChangeRules changes;
     std::chrono::milliseconds slow{2000};  ///< requests that take longer are told in the log
 };
 

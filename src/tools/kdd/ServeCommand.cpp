@@ -36,6 +36,8 @@ struct ServeRequest
     QList<QByteArray> hosts;
     bool stow = false;
     DimseRequest dimse;
+    bool corrections = false;
+    bool deletions = false;
 };
 
 QVector<QByteArray> wordsOf(QByteArray text)
@@ -119,6 +121,8 @@ bool readSettings(const GlobalOptions& options, const ServeRequest& request, Ser
     settings.addresses.publicAddress = orElse(request.publicAddress, ExResource::serverPublicAddress());
     settings.addresses.hosts = wordsOf(ExResource::serverHosts()) + request.hosts.toVector();
     settings.addresses.proxies = wordsOf(ExResource::serverProxies());
+    settings.changes.corrections = request.corrections || ExResource::serverTakesCorrections();
+    settings.changes.deletions = request.deletions || ExResource::serverDeletes();
     settings.takesByRequest = request.stow || ExResource::serverTakesObjects();
     settings.store.requestBytes = ExResource::serverRequestSize() * qint64(1024 * 1024);
     DimseOrder order;
@@ -226,6 +230,9 @@ void declareServe(CommandSet& commands)
                    request->publicAddress);
     arguments.flag("--stow", request->stow, "Take objects that clients send (STOW-RS)");
     request->dimse.addTo(arguments);
+    arguments.flag("--corrections", request->corrections,
+                   "Take corrections of what is stored, and moves between studies");
+    arguments.flag("--deletions", request->deletions, "Delete studies, series and images when asked to");
     arguments.texts({"--host", "NAME", "Further name by which the server may be asked; may be repeated"},
                     request->hosts);
 }

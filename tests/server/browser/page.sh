@@ -25,5 +25,5 @@ cat >"$folder/job.xml" <<'XML'
 XML
 "$kdd" --quiet qa "$folder/job.xml" --study "$study" --image "$image"
 
-serve
+serve --corrections --deletions
 node "$here/page.mjs" "$root" "$pictures"
