@@ -49,7 +49,8 @@ std::vector<std::unique_ptr<DicomWeb::Resource>> makeResources(ServedArchive& ar
     resources.push_back(std::make_unique<RenderedResource>(archive.studies, archive.objects));
     resources.push_back(std::make_unique<UriResource>(archive.studies, archive.objects));
     if (archive.arrivals != nullptr)
-        resources.push_back(std::make_unique<StoreResource>(*archive.arrivals, archive.storeLimits));
+        resources.push_back(
+            std::make_unique<StoreResource>(*archive.arrivals, archive.sight, archive.storeLimits));
     return resources;
 }
 

@@ -3,7 +3,7 @@
 #include "server/dicomweb/Resource.h"
 #include "server/dicomweb/StudyShelf.h"
 #include "server/dicomweb/retrieve/ObjectShelf.h"
-#include "server/dicomweb/search/ThreadSearch.h"
+#include "server/dicomweb/search/StudySight.h"
 #include "server/dicomweb/store/StoreBody.h"
 #include "server/http/Metrics.h"
 
@@ -22,6 +22,7 @@ struct ServedArchive
     std::shared_ptr<DicomWeb::StudyShelf> studies = std::make_shared<DicomWeb::StudyShelf>(qint64(64) << 20);
     std::shared_ptr<DicomWeb::ObjectShelf> objects = std::make_shared<DicomWeb::ObjectShelf>(32 << 20);
     DicomWeb::ThreadSearch database{Kxg::DatabaseServer()};
+    DicomWeb::StudySight sight{database, *studies};
     std::unique_ptr<DicomWeb::ArrivalService> arrivals;  ///< null where no objects are taken
     DicomWeb::StoreLimits storeLimits;
 };

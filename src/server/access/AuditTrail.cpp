@@ -74,8 +74,12 @@ QByteArray AuditTrail::lineOf(const Http::Exchange& exchange) const
                         {QStringLiteral("whole"), exchange.isWhole},
                         {QStringLiteral("request"), QString::fromLatin1(request.id)}};
     // Else it is a text that a client made up, and might be a name.
-    if (DicomWeb::isUID(asked.study))
-        line.insert(QStringLiteral("studies"), QJsonArray{QString::fromLatin1(asked.study)});
+    QJsonArray studies;
+    for (const QByteArray& study : QVector<QByteArray>{asked.study} + exchange.changed)
+        if (DicomWeb::isUID(study) && !studies.contains(QString::fromLatin1(study)))
+            studies.append(QString::fromLatin1(study));
+    if (!studies.isEmpty())
+        line.insert(QStringLiteral("studies"), studies);
     if (mProxies.contains(request.peer))
         if (const QByteArray client = clientOf(request); !client.isEmpty())
             line.insert(QStringLiteral("client"), QString::fromLatin1(client));

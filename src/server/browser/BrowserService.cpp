@@ -91,6 +91,7 @@ Http::Response BrowserService::config(const Http::Request& request) const
 {
     return jsonAnswer(request, {{QStringLiteral("dicomWeb"), QString::fromUtf8(mSettings.dicomWeb)},
                                 {QStringLiteral("viewer"), mSettings.hasViewer},
+                                {QStringLiteral("signIn"), mSettings.hasSignIn},
                                 {QStringLiteral("thumbnails"), mSettings.hasThumbnails}});
 }
 

@@ -18,6 +18,7 @@ struct Exchange
     qint64 bytes = 0;                      ///< sent, with the header
     std::chrono::microseconds duration{};  ///< from the whole request to the last byte handed to the system
     bool isWhole = false;                  ///< the answer; else it was broken off
+    QVector<QByteArray> changed;           ///< studies that its body had changed, as BodySink tells
     QString fault;                         ///< why we did that; empty when the client did
 };
 

@@ -39,6 +39,9 @@ public:
 
     /// The answer, once the body has come whole or no more of it is wanted.
     virtual Response answer() = 0;
+
+    /// Names, apart from those in the request, of what was changed so far: for those who are told of the exchange.
+    virtual QVector<QByteArray> changed() const { return {}; }
 };
 
 /// What an answer consists of, in this order. Its length is known unless there is a producer, and is then sent.

@@ -197,6 +197,7 @@ void Session::prepareRequest()
     mBegan = Clock::now();
     mRequest = mReader.take();
     mCaller.clear();
+    mChanged.clear();
     mRequest.peer = mPeer;
     mRequest.isEncrypted = qstrcmp(mTransport->scheme(), "https") == 0;
     mRequest.certificate = mTransport->peerName();
@@ -316,8 +317,8 @@ void Session::report(bool isWhole)
 {
     --mHost.inFlight;
     const auto duration = std::chrono::duration_cast<std::chrono::microseconds>(Clock::now() - mBegan);
-    mHost.observer.ended(
-        {mRequest, mCaller, mWriter->status(), mWriter->bytesSent(), duration, isWhole, mWriter->fault()});
+    mHost.observer.ended({mRequest, mCaller, mWriter->status(), mWriter->bytesSent(), duration, isWhole,
+                          mChanged, mWriter->fault()});
     mWriter.reset();
     mRequest = {};
 }
@@ -325,10 +326,11 @@ void Session::report(bool isWhole)
 /// The client went before its request was whole.
 void Session::reportBrokenOff()
 {
+    const QVector<QByteArray> changed = mSink != nullptr ? mSink->changed() : QVector<QByteArray>();
     mSink.reset();
     --mHost.inFlight;
     const auto duration = std::chrono::duration_cast<std::chrono::microseconds>(Clock::now() - mBegan);
-    mHost.observer.ended({mRequest, mCaller, 400, 0, duration, false, {}});
+    mHost.observer.ended({mRequest, mCaller, 400, 0, duration, false, changed, {}});
     mRequest = {};
 }
 

@@ -90,6 +90,7 @@ private:
     Request mRequest;
     QByteArray mPeer;
     QByteArray mCaller;  // of the request that is answered
+    QVector<QByteArray> mChanged;
     std::optional<ResponseWriter> mWriter;
     std::unique_ptr<BodySink> mSink;  // while a body is received
     QVector<Field> mHeaders;          // of the answer that it gives

@@ -142,6 +142,7 @@ bool Session::isTooSlow() const
 
 void Session::endBody(Response response, Afterwards afterwards)
 {
+    mChanged = mSink != nullptr ? mSink->changed() : QVector<QByteArray>();
     mSink.reset();
     response.headers += mHeaders;
     // From here on the client waits.

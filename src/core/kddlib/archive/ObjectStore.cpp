@@ -181,7 +181,8 @@ public:
     }
 
     /// Reads, checks and flushes each.
-    void prepare(std::vector<std::unique_ptr<ObjectArrival>>& arrivals, const QByteArray& studyUID);
+    void prepare(std::vector<std::unique_ptr<ObjectArrival>>& arrivals, const QByteArray& studyUID,
+                 const Admission& admits);
     void store();
     std::vector<ArrivedObject> take();
 
@@ -204,7 +205,7 @@ private:
 };
 
 void ObjectStore::Batch::prepare(std::vector<std::unique_ptr<ObjectArrival>>& arrivals,
-                                 const QByteArray& studyUID)
+                                 const QByteArray& studyUID, const Admission& admits)
 {
     for (const auto& arrival : arrivals) {
         ObjectArrival::Private& received = *arrival->d;
@@ -213,8 +214,10 @@ void ObjectStore::Batch::prepare(std::vector<std::unique_ptr<ObjectArrival>>& ar
         entry.input.path = received.file.path();
         if (received.fault != ArrivalFault::None)
             refuse(entry.object, received.fault, received.reason);
-        else
-            ObjectPlaces::check(entry.input, studyUID, entry.object);
+        else if (ObjectPlaces::check(entry.input, studyUID, entry.object) && admits &&
+                 !admits(*entry.input.map))
+            refuse(entry.object, ArrivalFault::NotAllowed,
+                   QStringLiteral("Whoever sent it may not store into such studies"));
         mEntries.push_back(std::move(entry));
     }
     // Apart from the reading: while the first one is waited for the others are written too.
@@ -297,10 +300,11 @@ std::vector<ArrivedObject> ObjectStore::Batch::take()
 }
 
 std::vector<ArrivedObject> ObjectStore::commit(std::vector<std::unique_ptr<ObjectArrival>>& arrivals,
-                                               Kxg::Catalogue& catalogue, const QByteArray& studyUID)
+                                               Kxg::Catalogue& catalogue, const QByteArray& studyUID,
+                                               const Admission& admits)
 {
     Batch batch(*d, catalogue);
-    batch.prepare(arrivals, studyUID);
+    batch.prepare(arrivals, studyUID, admits);
     batch.store();
     return batch.take();
 }

@@ -13,6 +13,7 @@ import { listView } from './list.js';
 import { correctionsView } from './corrections.js';
 import { differenceView } from './difference.js';
 import { imageView } from './image.js';
+import { returnToPlace } from './session.js';
 import { studyView } from './study.js';
 import { volumesView } from './volumes.js';
 
@@ -120,5 +121,6 @@ addEventListener('online', () => {
 offline.hidden = navigator.onLine;
 
 // Without it the page is whole but for links to what else the server has.
+returnToPlace();
 await readConfig().catch(() => config);
 show();
