@@ -18,6 +18,9 @@ TokenRules rules()
     made.audiences = {QStringLiteral("a")};
     made.rights = {{QStringLiteral("scope"), QStringLiteral("r"), Right::Read},
                    {QStringLiteral("a.b"), QStringLiteral("r"), Right::Store}};
+    ClaimLimit limit = {QStringLiteral("studies"), {}};
+    DicomWeb::StudyRule::resolve("ReferringPhysicianName", limit.rule);
+    made.studies = {limit};
     return made;
 }
 
@@ -38,8 +41,10 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, std::size_t size)
         Caller caller;
         if (faultOfClaims(token.claims, rules(), now, until).isEmpty())
             require(until > now, "a good token is good for a while");
-        if (callerOfClaims(token.claims, rules(), caller))
+        if (callerOfClaims(token.claims, rules(), caller).isEmpty())
             require(!caller.subject.isEmpty(), "somebody has a name");
+        if (!token.claims.contains(QStringLiteral("studies")))
+            require(caller.subject.isEmpty() || caller.studies != nullptr, "who names no study sees none");
     }
     QByteArray bytes;
     if (decodeBase64Url(text, bytes))

@@ -89,6 +89,7 @@ set(KDD_PUBLIC_HEADERS
   platform/database/SearchRecord.h
   platform/database/SearchText.h
   platform/database/StorageManager.h
+  platform/database/StudyLimits.h
   platform/database/StudySearch.h
   platform/database/TagFileStamp.h
   platform/filecache/ExFileCache.h

@@ -1,7 +1,7 @@
 #include "server/PeersFile.h"
 
 #include "server/access/HostName.h"
-#include "server/access/StrictJson.h"
+#include "server/http/StrictJson.h"
 
 #include <QFile>
 #include <QJsonArray>

@@ -51,7 +51,8 @@ std::vector<std::unique_ptr<DicomWeb::Resource>> makeResources(ServedArchive& ar
     resources.push_back(std::make_unique<RenderedResource>(archive.studies, archive.objects));
     resources.push_back(std::make_unique<UriResource>(archive.studies, archive.objects));
     if (archive.arrivals != nullptr && archive.takesByRequest)
-        resources.push_back(std::make_unique<StoreResource>(*archive.arrivals, archive.storeLimits));
+        resources.push_back(
+            std::make_unique<StoreResource>(*archive.arrivals, archive.sight, archive.storeLimits));
     resources.push_back(std::make_unique<CorrectionsResource>(*archive.studies, *archive.changes));
     resources.push_back(std::make_unique<RemovalResource>(archive.catalogue, *archive.changes));
     return resources;

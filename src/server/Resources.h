@@ -4,7 +4,7 @@
 #include "server/dicomweb/StudyShelf.h"
 #include "server/dicomweb/change/Turns.h"
 #include "server/dicomweb/retrieve/ObjectShelf.h"
-#include "server/dicomweb/search/ThreadSearch.h"
+#include "server/dicomweb/search/StudySight.h"
 #include "server/dicomweb/store/StoreBody.h"
 #include "server/http/Metrics.h"
 
@@ -23,6 +23,7 @@ struct ServedArchive
     std::shared_ptr<DicomWeb::StudyShelf> studies = std::make_shared<DicomWeb::StudyShelf>(qint64(64) << 20);
     std::shared_ptr<DicomWeb::ObjectShelf> objects = std::make_shared<DicomWeb::ObjectShelf>(32 << 20);
     DicomWeb::ThreadSearch database{Kxg::DatabaseServer()};
+    DicomWeb::StudySight sight{database, *studies};
     std::unique_ptr<DicomWeb::ArrivalService> arrivals;  ///< null where no objects are taken
     bool takesByRequest = true;                          ///< and not by associations alone
     DicomWeb::StoreLimits storeLimits;

@@ -7,6 +7,7 @@
 #include "server/StatusPages.h"
 #include "server/ViewerFiles.h"
 #include "server/access/AccessGate.h"
+#include "server/access/AuditMessages.h"
 #include "server/access/AuditTrail.h"
 #include "server/browser/BrowserService.h"
 #include "server/dicomweb/DicomWebService.h"
@@ -132,26 +133,32 @@ std::unique_ptr<Access::AuditTrail> makeTrail(const ServerSettings& settings,
                                                 settings.addresses.proxies);
 }
 
-class LogAndTrail : public Http::ExchangeObserver
+std::unique_ptr<Access::AuditMessages> makeMessages(const ServerSettings& settings,
+                                                    const QVector<QByteArray>& prefix)
+{
+    if (!settings.access->syslog)
+        return nullptr;
+    return std::make_unique<Access::AuditMessages>(*settings.access->syslog, Access::RightsTable(prefix));
+}
+
+class Observers : public Http::ExchangeObserver
 {
 public:
-    /// Both outlive this; there need not be a trail.
-    LogAndTrail(Http::ExchangeObserver& log, Http::ExchangeObserver* trail)
-        : mLog(log)
-        , mTrail(trail)
+    /// They outlive this; a null is nobody.
+    explicit Observers(std::initializer_list<Http::ExchangeObserver*> all)
+        : mAll(all)
     {
     }
 
     void ended(const Http::Exchange& exchange) override
     {
-        mLog.ended(exchange);
-        if (mTrail != nullptr)
-            mTrail->ended(exchange);
+        for (Http::ExchangeObserver* each : mAll)
+            if (each != nullptr)
+                each->ended(exchange);
     }
 
 private:
-    Http::ExchangeObserver& mLog;
-    Http::ExchangeObserver* mTrail;
+    const std::vector<Http::ExchangeObserver*> mAll;
 };
 
 /// Those who watch are none of whom is watched.
@@ -165,13 +172,20 @@ public:
 
 struct Server::Private
 {
-    Private(const ServerSettings& settings, std::unique_ptr<DicomWeb::ArrivalService> arrivals)
+    Private(const ServerSettings& settings, std::unique_ptr<DicomWeb::ArrivalService> arrivals,
+            std::unique_ptr<Access::SignIn> signIn)
         : prefix(Router::segmentsOf(settings.prefix))
         , log(metrics, prefix, settings.slow)
         , trail(makeTrail(settings, prefix))
-        , observers{log, trail.get()}
+        , messages(makeMessages(settings, prefix))
+        , observers({&log, trail.get(), messages.get()})
         , statusPages(metrics)
-        , gate(*settings.access, Access::RightsTable(prefix), settings.addresses.proxies, router)
+        , gate(
+              *settings.access, Access::RightsTable(prefix), settings.addresses.proxies,
+              [this](const auto& limits, const QByteArray& study) {
+                  return archive.sight.look(limits, study);
+              },
+              std::move(signIn), router)
         , guard(settings.addresses, gate)
         , statusGuard(settings.addresses, statusPages)
         , http(settings.http, guard, observers)
@@ -191,6 +205,7 @@ struct Server::Private
         browser.hasViewer = !settings.viewer.isEmpty();
         browser.hasThumbnails = true;
         browser.changes = possibleChanges(settings);
+        browser.hasSignIn = settings.access->signIn.has_value();
         router.add({}, std::make_unique<Browser::BrowserService>(*archive.studies, browser));
         if (settings.status)
             status = std::make_unique<Http::HttpServer>(statusSettings(settings), statusGuard, unobserved);
@@ -206,7 +221,8 @@ struct Server::Private
     Http::Metrics metrics;
     RequestLog log;
     std::unique_ptr<Access::AuditTrail> trail;
-    LogAndTrail observers;
+    std::unique_ptr<Access::AuditMessages> messages;
+    Observers observers;
     Unobserved unobserved;
     Router router;
     StatusPages statusPages;
@@ -231,6 +247,9 @@ std::unique_ptr<Server> Server::make(ServerSettings settings, Result& result)
     std::unique_ptr<DicomWeb::ArrivalService> arrivals;
     if (result.good() && settings.objects)
         arrivals = DicomWeb::ArrivalService::make(*settings.objects, Kxg::DatabaseServer(), result);
+    std::unique_ptr<Access::SignIn> signIn;
+    if (result.good() && settings.access && settings.access->signIn)
+        signIn = Access::SignIn::open(*settings.access->tokens, *settings.access->signIn, result);
     if (result.bad())
         return nullptr;
     settings.http.connections = affordableConnections(settings.http.connections);
@@ -240,7 +259,7 @@ std::unique_ptr<Server> Server::make(ServerSettings settings, Result& result)
         settings.access = Access::AccessRules::open();
     if (settings.access->certificates)
         settings.http.clientCaFile = settings.access->certificates->caFile;
-    auto made = std::make_unique<Private>(settings, std::move(arrivals));
+    auto made = std::make_unique<Private>(settings, std::move(arrivals), std::move(signIn));
     if (made->trail != nullptr)
         result = made->trail->check();
     if (result.good() && settings.dimse) {

@@ -1,6 +1,7 @@
 #include "platform/database/SearchSql.h"
 
 #include "platform/database/SearchColumns.h"
+#include "platform/database/SearchLimits.h"
 #include "platform/database/SqlConnection.h"
 
 #include <algorithm>
@@ -42,9 +43,10 @@ QByteArray phrase(const QByteArray& column, QByteArray part)
 class Conditions
 {
 public:
-    Conditions(const SqlDialect& dialect, const QSet<QByteArray>& frequent)
+    Conditions(const SqlDialect& dialect, const StudyLimits* limits, const QSet<QByteArray>& frequent)
         : mDialect(dialect)
         , mFrequent(frequent)
+        , mStudy(limits != nullptr ? limitsSql(dialect, *limits) : SearchSql())
     {
     }
 
@@ -250,10 +252,10 @@ const SearchTerm* leadingModality(const SearchQuery& query, const QSet<QByteArra
 }
 
 /// "FROM ... WHERE ..." of the studies that are found, as `s`.
-SearchSql studiesFrom(const SqlDialect& dialect, const SearchQuery& query, bool isListed,
-                      const QSet<QByteArray>& frequent = {})
+SearchSql studiesFrom(const SqlDialect& dialect, const SearchQuery& query, const StudyLimits* limits,
+                      bool isListed, const QSet<QByteArray>& frequent = {})
 {
-    Conditions conditions(dialect, frequent);
+    Conditions conditions(dialect, limits, frequent);
     // The list of a modality is kept in its order. Walking it looks at nothing that is not wanted.
     const SearchTerm* leading = isListed ? leadingModality(query, frequent) : nullptr;
     for (const SearchTerm& term : query.terms) {
@@ -283,10 +285,10 @@ SearchSql studiesFrom(const SqlDialect& dialect, const SearchQuery& query, bool 
     return sql;
 }
 
-SearchSql seriesFrom(const SqlDialect& dialect, const SearchQuery& query)
+SearchSql seriesFrom(const SqlDialect& dialect, const SearchQuery& query, const StudyLimits* limits)
 {
     static const QSet<QByteArray> kNone;
-    Conditions conditions(dialect, kNone);
+    Conditions conditions(dialect, limits, kNone);
     for (const SearchTerm& term : query.terms)
         conditions.add(term);
     const SearchSql series = conditions.series();
@@ -305,10 +307,8 @@ void addPage(SearchSql& sql, const SearchQuery& query)
 
 SearchSql counted(const SearchSql& from, int most)
 {
-    SearchSql sql;
-    sql.text = "SELECT COUNT(*) FROM (SELECT 1" + from.text + " LIMIT ?) counted";
-    sql.values = from.values + QVariantList{most};
-    return sql;
+    return {"SELECT COUNT(*) FROM (SELECT 1" + from.text + " LIMIT ?) counted",
+            from.values + QVariantList{most}};
 }
 
 }  // namespace
@@ -332,10 +332,11 @@ SearchSql isFrequentSql(const SqlDialect& dialect, const SearchTerm& term, const
             {kFrequent * kSample / kArchive, kSample, textValue(dialect.pattern(pattern))}};
 }
 
-SearchSql studiesSql(const SqlDialect& dialect, const SearchQuery& query, const QSet<QByteArray>& frequent)
+SearchSql studiesSql(const SqlDialect& dialect, const SearchQuery& query, const StudyLimits* limits,
+                     const QSet<QByteArray>& frequent)
 {
     // The page first, then what it shows: what answers show is large, and would be carried through the sorting.
-    const SearchSql from = studiesFrom(dialect, query, true, frequent);
+    const SearchSql from = studiesFrom(dialect, query, limits, true, frequent);
     const bool isByModality = from.text.startsWith(" FROM study_modality");
     SearchSql sql;
     sql.text = QByteArray("SELECT page.*, a.attributes FROM (SELECT ") + kStudyColumns +
@@ -348,9 +349,9 @@ SearchSql studiesSql(const SqlDialect& dialect, const SearchQuery& query, const 
     return sql;
 }
 
-SearchSql seriesSql(const SqlDialect& dialect, const SearchQuery& query)
+SearchSql seriesSql(const SqlDialect& dialect, const SearchQuery& query, const StudyLimits* limits)
 {
-    SearchSql sql = seriesFrom(dialect, query);
+    SearchSql sql = seriesFrom(dialect, query, limits);
     sql.text = QByteArray("SELECT page.*, a.attributes, r.instance_count, r.attributes FROM (SELECT ") +
                kStudyColumns +
                ", r.uid AS series_uid, s.study_date, s.study_time, s.sort_name, s.patient_id,"
@@ -363,9 +364,9 @@ SearchSql seriesSql(const SqlDialect& dialect, const SearchQuery& query)
     return sql;
 }
 
-SearchSql patientsSql(const SqlDialect& dialect, const SearchQuery& query)
+SearchSql patientsSql(const SqlDialect& dialect, const SearchQuery& query, const StudyLimits* limits)
 {
-    SearchSql sql = studiesFrom(dialect, query, false);
+    SearchSql sql = studiesFrom(dialect, query, limits, false);
     sql.text =
         "SELECT page.studies, a.attributes FROM (SELECT s.sort_name, s.patient_id, COUNT(*) AS studies,"
         " MAX(s.study_id) AS study_id" +
@@ -376,14 +377,23 @@ SearchSql patientsSql(const SqlDialect& dialect, const SearchQuery& query)
     return sql;
 }
 
-SearchSql countStudiesSql(const SqlDialect& dialect, const SearchQuery& query, int most)
+SearchSql visibleSql(const SqlDialect& dialect, const SearchQuery& query, const StudyLimits& limits)
 {
-    return counted(studiesFrom(dialect, query, true), most);
+    SearchSql sql = studiesFrom(dialect, query, &limits, false);
+    sql.text.prepend("SELECT s.uid");
+    return sql;
 }
 
-SearchSql countSeriesSql(const SqlDialect& dialect, const SearchQuery& query, int most)
+SearchSql countStudiesSql(const SqlDialect& dialect, const SearchQuery& query, const StudyLimits* limits,
+                          int most)
 {
-    return counted(seriesFrom(dialect, query), most);
+    return counted(studiesFrom(dialect, query, limits, true), most);
+}
+
+SearchSql countSeriesSql(const SqlDialect& dialect, const SearchQuery& query, const StudyLimits* limits,
+                         int most)
+{
+    return counted(seriesFrom(dialect, query, limits), most);
 }
 
 }  // namespace Kxg

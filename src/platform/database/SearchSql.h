@@ -20,20 +20,27 @@ struct SearchSql
 /// an empty text when the engine decides by itself.
 SearchSql isFrequentSql(const SqlDialect& dialect, const SearchTerm& term, const QByteArray& pattern);
 
+// Each leaves out the studies that are not within `limits`, where that is not null.
+//
 // Studies: id, uid, is_built, file_size, file_modified, digest, modalities, series, instances, attributes.
 //
 // `frequent` are the patterns that so many studies have that walking the list finds a page sooner than the index.
-SearchSql studiesSql(const SqlDialect& dialect, const SearchQuery& query,
-                     const QSet<QByteArray>& frequent = {});
+SearchSql studiesSql(const SqlDialect& dialect, const SearchQuery& query, const StudyLimits* limits,
+                     const QSet<QByteArray>& frequent);
 
 // Series: the same of the study, then uid, instances, attributes.
-SearchSql seriesSql(const SqlDialect& dialect, const SearchQuery& query);
+SearchSql seriesSql(const SqlDialect& dialect, const SearchQuery& query, const StudyLimits* limits);
 
 // Patients: number of studies, attributes.
-SearchSql patientsSql(const SqlDialect& dialect, const SearchQuery& query);
+SearchSql patientsSql(const SqlDialect& dialect, const SearchQuery& query, const StudyLimits* limits);
+
+// UIDs, all of them.
+SearchSql visibleSql(const SqlDialect& dialect, const SearchQuery& query, const StudyLimits& limits);
 
 // Their number, at most `most`.
-SearchSql countStudiesSql(const SqlDialect& dialect, const SearchQuery& query, int most);
-SearchSql countSeriesSql(const SqlDialect& dialect, const SearchQuery& query, int most);
+SearchSql countStudiesSql(const SqlDialect& dialect, const SearchQuery& query, const StudyLimits* limits,
+                          int most);
+SearchSql countSeriesSql(const SqlDialect& dialect, const SearchQuery& query, const StudyLimits* limits,
+                         int most);
 
 }  // namespace Kxg

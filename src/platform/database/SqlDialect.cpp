@@ -28,6 +28,7 @@ SqlDialect sqlite()
     dialect.text = QStringLiteral("TEXT");
     dialect.bytes = QStringLiteral("BLOB");
     dialect.bytesOf = QStringLiteral("CAST(%1 AS BLOB)");
+    dialect.holds = QStringLiteral("instr(%1, ?) > 0");
     dialect.wordsOf = QStringLiteral("%1 GLOB ?");
     dialect.hasMatchIndex = true;
     return dialect;
@@ -69,6 +70,7 @@ SqlDialect postgres()
     dialect.text = QStringLiteral("TEXT COLLATE \"C\"");
     dialect.bytes = QStringLiteral("BYTEA");
     dialect.bytesOf = QStringLiteral("convert_to(%1, 'UTF8')");
+    dialect.holds = QStringLiteral("position(CAST(? AS BYTEA) IN %1) > 0");
     dialect.wordsOf = QStringLiteral("%1 LIKE ?");
     return dialect;
 }

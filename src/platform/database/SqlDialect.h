@@ -31,6 +31,7 @@ struct SqlDialect
     QString bytes;  ///< likewise
 
     QString bytesOf;  ///< the bytes of a text, which stands in place of %1
+    QString holds;    ///< whether bytes are among those of the column %1
 
     // texts of studies, which are searched for parts
     QString wordsOf;  ///< whether the column %1 matches a pattern

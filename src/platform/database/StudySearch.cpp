@@ -20,6 +20,10 @@ using Access = SqlConnection::Access;
 constexpr int kStudyColumns = 9;
 constexpr int kSortColumns = 8;  // which the engine gives along
 
+/// Of changes, where not all may be seen: so many are read at a time, and looked at for one answer.
+constexpr int kChangesAtOnce = 500;
+constexpr int kMostLooked = 20000;
+
 FoundStudy studyOf(const SqlRows& rows, int attributes)
 {
     FoundStudy study;
@@ -94,7 +98,45 @@ struct StudySearch::Private
         });
     }
 
+    /// Those of the studies that are within the limits.
+    QSet<QByteArray> visible(const QVector<QByteArray>& studyUIDs)
+    {
+        QSet<QByteArray> found;
+        SearchQuery query;
+        query.terms.push_back({SearchColumn::StudyUID, studyUIDs, {}, {}, {}, {}, {}});
+        const SearchSql sql = visibleSql(dialect(), query, *limits);
+        SqlRows rows = connection.askOnce(sql.text, sql.values);
+        while (rows.next())
+            found.insert(rows.text(0));
+        return found;
+    }
+
+    /// As many as are missing; `last` is the position of the last one that was looked at.
+    void takeVisible(const std::vector<StudyChangeNote>& page, int missing,
+                     std::vector<StudyChangeNote>& changes, qint64& last)
+    {
+        QVector<QByteArray> named;
+        for (const StudyChangeNote& change : page)
+            named << change.studyInstanceUID << change.movedFrom << change.movedTo;
+        const QSet<QByteArray> seen =
+            limits != nullptr && !page.empty() ? visible(named) : QSet<QByteArray>();
+        const auto isSeen = [&](const QByteArray& uid) { return limits == nullptr || seen.contains(uid); };
+        for (StudyChangeNote change : page) {
+            if (missing == 0)
+                return;
+            last = change.position;
+            if (!isSeen(change.studyInstanceUID))
+                continue;
+            for (QByteArray* other : {&change.movedFrom, &change.movedTo})
+                if (!isSeen(*other))
+                    other->clear();
+            changes.push_back(std::move(change));
+            --missing;
+        }
+    }
+
     SqlConnection connection;
+    std::shared_ptr<const StudyLimits> limits;
 };
 
 std::unique_ptr<StudySearch> StudySearch::open(const QByteArray& address, Kdd::Result& result)
@@ -114,6 +156,11 @@ StudySearch::StudySearch(std::unique_ptr<Private> made)
 
 StudySearch::~StudySearch() = default;
 
+void StudySearch::limitTo(std::shared_ptr<const StudyLimits> limits)
+{
+    d->limits = std::move(limits);
+}
+
 Kdd::Result StudySearch::studies(const SearchQuery& query, std::vector<FoundStudy>& found, int* behind)
 {
     found.clear();
@@ -123,7 +170,7 @@ Kdd::Result StudySearch::studies(const SearchQuery& query, std::vector<FoundStud
     const Kdd::Result counted = d->findFrequent(query, frequent);
     if (counted.bad())
         return counted;
-    return d->ask(studiesSql(d->dialect(), query, frequent), [&](const SqlRows& rows) {
+    return d->ask(studiesSql(d->dialect(), query, d->limits.get(), frequent), [&](const SqlRows& rows) {
         takeOrCount(found, query.limit, behind, [&] { return studyOf(rows, kStudyColumns + kSortColumns); });
     });
 }
@@ -133,7 +180,7 @@ Kdd::Result StudySearch::series(const SearchQuery& query, std::vector<FoundSerie
     found.clear();
     if (behind != nullptr)
         *behind = 0;
-    return d->ask(seriesSql(d->dialect(), query), [&](const SqlRows& rows) {
+    return d->ask(seriesSql(d->dialect(), query, d->limits.get()), [&](const SqlRows& rows) {
         // The series' UID and number stand among those that it is sorted by.
         const int attributes = kStudyColumns + kSortColumns + 2;
         takeOrCount(found, query.limit, behind, [&] {
@@ -146,26 +193,40 @@ Kdd::Result StudySearch::series(const SearchQuery& query, std::vector<FoundSerie
 Kdd::Result StudySearch::patients(const SearchQuery& query, std::vector<FoundPatient>& found)
 {
     found.clear();
-    return d->ask(patientsSql(d->dialect(), query), [&](const SqlRows& rows) {
+    return d->ask(patientsSql(d->dialect(), query, d->limits.get()), [&](const SqlRows& rows) {
         found.push_back({static_cast<int>(rows.number(0)), rows.bytes(1)});
     });
 }
 
 Kdd::Result StudySearch::countStudies(const SearchQuery& query, int most, int& count)
 {
-    return d->ask(countStudiesSql(d->dialect(), query, most),
+    return d->ask(countStudiesSql(d->dialect(), query, d->limits.get(), most),
                   [&](const SqlRows& rows) { count = static_cast<int>(rows.number(0)); });
 }
 
 Kdd::Result StudySearch::countSeries(const SearchQuery& query, int most, int& count)
 {
-    return d->ask(countSeriesSql(d->dialect(), query, most),
+    return d->ask(countSeriesSql(d->dialect(), query, d->limits.get(), most),
                   [&](const SqlRows& rows) { count = static_cast<int>(rows.number(0)); });
 }
 
-Kdd::Result StudySearch::changes(qint64 position, int limit, std::vector<StudyChangeNote>& changes)
+Kdd::Result StudySearch::changes(qint64 position, int limit, std::vector<StudyChangeNote>& changes,
+                                 qint64& last)
 {
-    return d->transact(Access::Read, [&] { changes = changesAfter(d->connection, position, limit); });
+    return d->transact(Access::Read, [&] {
+        changes.clear();
+        last = position;
+        int missing = limit;
+        for (int looked = 0; missing > 0 && looked < kMostLooked;) {
+            const int wanted = d->limits == nullptr ? missing : kChangesAtOnce;
+            const std::vector<StudyChangeNote> page = changesAfter(d->connection, last, wanted);
+            d->takeVisible(page, missing, changes, last);
+            missing = limit - static_cast<int>(changes.size());
+            looked += wanted;
+            if (static_cast<int>(page.size()) < wanted)
+                return;
+        }
+    });
 }
 
 Kdd::Result StudySearch::refresh(const FoundStudy& former, const BuiltStudy& present, bool& isDone)
@@ -227,7 +288,7 @@ Kdd::Result StudySearch::explainStudies(const SearchQuery& query, QByteArray& pl
 {
     QSet<QByteArray> frequent;
     d->findFrequent(query, frequent);
-    SearchSql sql = studiesSql(d->dialect(), query, frequent);
+    SearchSql sql = studiesSql(d->dialect(), query, d->limits.get(), frequent);
     const bool isSqlite = d->connection.address().engine == DatabaseAddress::Engine::Sqlite;
     sql.text.prepend(isSqlite ? "EXPLAIN QUERY PLAN " : "EXPLAIN (ANALYZE, BUFFERS) ");
     plan.clear();

@@ -3,6 +3,7 @@
 #include "platform/base/Export.h"
 #include "platform/base/Result.h"
 #include "platform/database/Catalogue.h"
+#include "platform/database/StudyLimits.h"
 
 #include <QByteArray>
 #include <QVector>
@@ -118,6 +119,9 @@ public:
     StudySearch(const StudySearch&) = delete;
     StudySearch& operator=(const StudySearch&) = delete;
 
+    /// From here on whatever is asked finds studies within these limits alone; null: all.
+    void limitTo(std::shared_ptr<const StudyLimits> limits);
+
     /// `behind`, where it is not null, is set to how many of the studies behind the page were counted.
     Kdd::Result studies(const SearchQuery& query, std::vector<FoundStudy>& found, int* behind = nullptr);
 
@@ -131,8 +135,9 @@ public:
     Kdd::Result countStudies(const SearchQuery& query, int most, int& count);
     Kdd::Result countSeries(const SearchQuery& query, int most, int& count);
 
-    /// At most `limit` changes after a position, in order. Whoever goes on from the last one misses none.
-    Kdd::Result changes(qint64 position, int limit, std::vector<StudyChangeNote>& changes);
+    /// At most `limit` changes after a position, in order. `last` is the position up to which was looked: whoever goes on
+    /// from there misses none. Of a move the study that is beyond the limits is not named.
+    Kdd::Result changes(qint64 position, int limit, std::vector<StudyChangeNote>& changes, qint64& last);
 
     /// Takes over what the study's tag file shows now, unless somebody else did so since `former` was read. `isDone` tells
     /// whether the rows were changed.

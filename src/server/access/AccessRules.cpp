@@ -141,6 +141,16 @@ ClaimRule readClaimRule(Section rule)
     return made;
 }
 
+ClaimLimit readClaimLimit(Section limit)
+{
+    ClaimLimit made;
+    made.claim = limit.text("claim");
+    if (!DicomWeb::StudyRule::resolve(limit.text("attribute").toUtf8(), made.rule))
+        limit.fail("attribute", "is no attribute by which studies can be chosen");
+    limit.end();
+    return made;
+}
+
 TokenRules readTokens(Section section, Result& result)
 {
     TokenRules made;
@@ -160,6 +170,11 @@ TokenRules readTokens(Section section, Result& result)
         made.rights.append(readClaimRule(Section(rule, section.path("rights"), result)));
     if (rules.isEmpty())
         section.fail("rights", "is no list of rules: no token would give anything");
+    const QJsonValue limits = section.take("studies");
+    for (const QJsonValue limit : limits.toArray())
+        made.studies.push_back(readClaimLimit(Section(limit, section.path("studies"), result)));
+    if (!limits.isUndefined() && made.studies.empty())
+        section.fail("studies", "is no list of limits: leave it out where every token is for all studies");
     section.end();
     return made;
 }
@@ -188,6 +203,52 @@ CertificateRules readCertificates(Section section)
     CertificateRules made;
     made.caFile = pathBytes(section.text("caFile"));
     made.subjects = section.named("subjects");
+    section.end();
+    return made;
+}
+
+SignInRules readSignIn(Section section, const QString& issuer)
+{
+    constexpr int kShortest = 60;
+    constexpr int kLongest = 7 * 86400;
+    SignInRules made;
+    made.client = section.text("client");
+    if (section.has("secretFile"))
+        made.secretFile = section.text("secretFile");
+    made.scope = section.text("scope", made.scope);
+    if (!made.scope.split(QLatin1Char(' ')).contains(QStringLiteral("openid")))
+        section.fail("scope", "lacks openid");
+    const QString end = QStringLiteral("/.well-known/openid-configuration");
+    made.discovery =
+        section.text("discovery", issuer + (issuer.endsWith(QLatin1Char('/')) ? end.mid(1) : end)).toUtf8();
+    made.sessionKeys = section.text("sessionKeys");
+    made.session = section.seconds("session", made.session, kShortest, kLongest);
+    section.end();
+    return made;
+}
+
+SyslogRules readSyslog(Section section)
+{
+    SyslogRules made;
+    const QByteArray to = section.text("to").toUtf8();
+    const QByteArray place = to.mid(to.indexOf(':') + 1);
+    const int colon = place.lastIndexOf(':');
+    if (to.startsWith("unix:/")) {
+        made.by = SyslogRules::By::Socket;
+        made.host = place;
+    } else if (to.startsWith("tls://") || to.startsWith("udp://")) {
+        made.by = to.startsWith("tls") ? SyslogRules::By::Tls : SyslogRules::By::Udp;
+        const QByteArray host = hostOf(place.mid(2));
+        const bool hasPort = colon > 1 && !place.endsWith(']');
+        made.host = host.startsWith('[') ? host.mid(1, host.size() - 2) : host;
+        made.port = made.by == SyslogRules::By::Tls ? "6514" : "514";
+        if (hasPort)
+            made.port = place.mid(colon + 1);
+    }
+    if (made.host.isEmpty())
+        section.fail("to", "is no receiver: write tls://HOST[:PORT], udp://HOST[:PORT] or unix:/dev/log");
+    if (section.has("caFile"))
+        made.caFile = pathBytes(section.text("caFile"));
     section.end();
     return made;
 }
@@ -233,14 +294,26 @@ Result AccessRules::parse(const QByteArray& text, AccessRules& rules)
         made.header = readHeader(whole.section("header"));
     if (whole.has("certificates"))
         made.certificates = readCertificates(whole.section("certificates"));
+    if (whole.has("signIn")) {
+        if (!made.tokens)
+            whole.fail("signIn", "needs tokens, of whose issuer it is");
+        else
+            made.signIn = readSignIn(whole.section("signIn"), made.tokens->issuer);
+    }
     if (whole.has("cors"))
         made.origins = readOrigins(whole.section("cors"));
     if (whole.has("audit"))
         made.audit = pathBytes(whole.text("audit"));
+    if (whole.has("syslog"))
+        made.syslog = readSyslog(whole.section("syslog"));
     whole.end();
     if (result.good() && !made.anyone && !made.tokens && !made.header && !made.certificates)
         result = Result::failure(QStringLiteral("it lets nobody in: there are anyone, tokens, header and "
                                                 "certificates"));
+    // He would only have to leave his token at home.
+    if (result.good() && made.anyone && made.tokens && !made.tokens->studies.empty())
+        result = Result::failure(QStringLiteral(
+            "tokens.studies keeps nothing from anybody while anyone has rights to all studies"));
     if (result.good())
         rules = made;
     return result;

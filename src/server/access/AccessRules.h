@@ -1,6 +1,7 @@
 #pragma once
 
 #include "server/access/Caller.h"
+#include "server/dicomweb/search/StudyRule.h"
 
 #include <QHash>
 #include <QString>
@@ -10,6 +11,7 @@
 
 #include <chrono>
 #include <optional>
+#include <vector>
 
 namespace Kdd::Access
 {
@@ -20,6 +22,14 @@ struct ClaimRule
     QString claim;  ///< its name, or a path with points into objects; empty: every token gives this
     QString value;  ///< the claim, a word of it, or an item of its list
     Rights gives;
+};
+
+/// Whoever brings a token sees the studies alone whose attribute has one of the values of the claim; all when one of these is
+/// "*", and none when there are none.
+struct ClaimLimit
+{
+    QString claim;  ///< as above: a text or a list of texts
+    DicomWeb::StudyRule rule;
 };
 
 /// Which tokens are good, and for what.
@@ -34,6 +44,7 @@ struct TokenRules
     std::chrono::seconds keysKept{86400};     ///< for which they serve when they cannot be asked for
     QString subject = QStringLiteral("sub");  ///< claim that tells who it is
     QVector<ClaimRule> rights;
+    std::vector<ClaimLimit> studies;  ///< all hold; none: every study
 };
 
 /// Rights by name; "*" stands for everybody who has a name.
@@ -54,11 +65,33 @@ struct CertificateRules
     NamedRights subjects;
 };
 
+/// How people sign in with a browser, at the provider that issues the tokens.
+struct SignInRules
+{
+    QString client;      ///< the name by which the provider knows this server
+    QString secretFile;  ///< what both of them know; empty: nothing
+    QString scope = QStringLiteral("openid profile");
+    QByteArray discovery;                    ///< address of what the provider tells of itself
+    QString sessionKeys;                     ///< file of the keys that seal sessions
+    std::chrono::seconds session{8 * 3600};  ///< after which one has to sign in again
+};
+
 /// Which pages of other origins may read answers.
 struct OriginRules
 {
     QVector<QByteArray> origins;  ///< "https://viewer.example.org"
     std::chrono::seconds maxAge{7200};
+};
+
+/// Where audit messages go.
+struct SyslogRules
+{
+    enum class By { Tls, Udp, Socket };
+
+    By by = By::Tls;
+    QByteArray host;  ///< or the path of a socket
+    QByteArray port;
+    QByteArray caFile;  ///< PEM, by which the receiver has to prove itself; empty: those of the system
 };
 
 /// Who may what.
@@ -68,8 +101,10 @@ struct AccessRules
     std::optional<TokenRules> tokens;
     std::optional<HeaderRules> header;
     std::optional<CertificateRules> certificates;
+    std::optional<SignInRules> signIn;  ///< where there are tokens
     OriginRules origins;
     QByteArray audit;  ///< file of the audit trail, "log": the log; empty: there is none
+    std::optional<SyslogRules> syslog;
 
     /// Everybody may do everything.
     static AccessRules open();

@@ -3,6 +3,10 @@
 #include <QByteArray>
 #include <QFlags>
 
+#include <kddlib/StudyLimits.h>
+
+#include <memory>
+
 namespace Kdd::Access
 {
 
@@ -27,6 +31,8 @@ struct Caller
 {
     QByteArray subject;  ///< empty: nobody in particular
     Rights rights;
+    std::shared_ptr<const Kxg::StudyLimits> studies;  ///< that he may see; null: all
+    bool isByCookie = false;  ///< known by what browsers send along with whatever a page asks
 };
 
 }  // namespace Kdd::Access

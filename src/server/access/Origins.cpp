@@ -62,6 +62,15 @@ void Origins::mark(const Http::Request& request, Http::Response& response) const
     response.addHeader("Access-Control-Expose-Headers", kAnswerHeaders);
 }
 
+bool Origins::isOwn(const Http::Request& request)
+{
+    const QByteArray origin = request.header("origin");
+    if (!origin.isNull())
+        return origin == originOf(request.base);
+    const QByteArray site = request.header("sec-fetch-site");
+    return site.isNull() ? !request.header("x-requested-with").isEmpty() : site == "same-origin";
+}
+
 bool Origins::isForeign(const Http::Request& request) const
 {
     const QByteArray origin = request.header("origin");

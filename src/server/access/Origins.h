@@ -25,6 +25,10 @@ public:
     /// requests without asking before, with all that it knows of its user.
     bool isForeign(const Http::Request& request) const;
 
+    /// Whether it certainly comes from a page of ours, or from no page: browsers say of whom, and let a page of another origin
+    /// send no header of its own choice without asking.
+    static bool isOwn(const Http::Request& request);
+
 private:
     bool isKnown(const QByteArray& origin) const { return mOrigins.contains(origin); }
 

@@ -68,13 +68,30 @@ TokenCheck::Verdict TokenCheck::check(const QByteArray& token)
         return undecidable();
     if (find(digest, keys, verdict.caller))
         return verdict;
-    return verify(token, digest, keys);
+    std::shared_ptr<const TokenKeys> by = keys;
+    Known known;
+    QJsonObject claims;
+    verdict = verify(token, by, known.until, claims);
+    known.caller = verdict.caller;
+    if (verdict.fault.isEmpty() && !verdict.isUndecidable)
+        keep(digest, by, known);
+    return verdict;
 }
 
-TokenCheck::Verdict TokenCheck::verify(const QByteArray& token, const QByteArray& digest,
-                                       std::shared_ptr<const TokenKeys> keys)
+TokenCheck::Verdict TokenCheck::read(const QByteArray& token, QJsonObject& claims)
+{
+    claims = {};
+    std::chrono::seconds until{};
+    std::shared_ptr<const TokenKeys> keys = mKeys.present();
+    return keys == nullptr ? undecidable() : verify(token, keys, until, claims);
+}
+
+/// `keys` become those that it was verified with.
+TokenCheck::Verdict TokenCheck::verify(const QByteArray& token, std::shared_ptr<const TokenKeys>& keys,
+                                       std::chrono::seconds& until, QJsonObject& claims)
 {
     SignedToken read;
+    Verdict verdict;
     if (!SignedToken::parse(token, read))
         return refusal("The token cannot be read");
     // A provider that changes its keys signs with ones that are not known yet.
@@ -86,15 +103,12 @@ TokenCheck::Verdict TokenCheck::verify(const QByteArray& token, const QByteArray
         return refusal("The key of the token is not known");
     if (!keys->verify(read.keyId, read.algorithm, read.text, read.signature))
         return refusal("The signature of the token is not good");
-    Known known;
-    Verdict verdict;
-    verdict.fault = faultOfClaims(read.claims, mRules, mClock(), known.until);
-    if (verdict.fault.isEmpty() && !callerOfClaims(read.claims, mRules, known.caller))
-        verdict.fault = "The token names nobody";
+    verdict.fault = faultOfClaims(read.claims, mRules, mClock(), until);
+    if (verdict.fault.isEmpty())
+        verdict.fault = callerOfClaims(read.claims, mRules, verdict.caller);
     if (!verdict.fault.isEmpty())
-        return verdict;
-    keep(digest, keys, known);
-    verdict.caller = known.caller;
+        return refusal(verdict.fault.constData());
+    claims = read.claims;
     return verdict;
 }
 

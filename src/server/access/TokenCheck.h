@@ -2,6 +2,8 @@
 
 #include "server/access/ProviderKeys.h"
 
+#include <QJsonObject>
+
 namespace Kdd::Access
 {
 
@@ -24,6 +26,9 @@ public:
 
     Verdict check(const QByteArray& token);
 
+    /// The same with what the token says, which is empty when it is not good. Nothing is remembered of it.
+    Verdict read(const QByteArray& token, QJsonObject& claims);
+
 private:
     struct Known
     {
@@ -31,7 +36,8 @@ private:
         std::chrono::seconds until{};
     };
 
-    Verdict verify(const QByteArray& token, const QByteArray& digest, std::shared_ptr<const TokenKeys> keys);
+    Verdict verify(const QByteArray& token, std::shared_ptr<const TokenKeys>& keys,
+                   std::chrono::seconds& until, QJsonObject& claims);
     bool find(const QByteArray& digest, const std::shared_ptr<const TokenKeys>& keys, Caller& caller);
     void keep(const QByteArray& digest, const std::shared_ptr<const TokenKeys>& keys, const Known& known);
 

@@ -11,6 +11,7 @@ namespace
 {
 
 constexpr double kLatest = 1e12;      // [s since 1970]; nothing that is added to it overflows
+constexpr int kMostValues = 500;      // of a claim that limits studies; each is held against every study
 constexpr int kLongestSubject = 256;  // characters; it stands in every line of the audit trail
 
 /// Null when it is no moment; nothing when there is none.
@@ -24,6 +25,32 @@ std::optional<double> momentOf(const QJsonObject& claims, const char* name, bool
     return moment;
 }
 
+/// What stands in the way of all studies; false when there is too much of it.
+bool limitsOf(const QJsonObject& claims, const TokenRules& rules, Kxg::StudyLimits& limits)
+{
+    for (const ClaimLimit& each : rules.studies) {
+        const QJsonValue claim = claimOf(claims, each.claim);
+        QStringList values;
+        const QJsonArray items = claim.isArray() ? claim.toArray() : QJsonArray{claim};
+        for (const QJsonValue item : items)
+            values.append(item.toString());
+        if (values.size() > kMostValues)
+            return false;
+        if (!values.contains(QStringLiteral("*")))
+            limits.all.push_back(each.rule.limit(values));
+    }
+    return true;
+}
+
+bool isMeantFor(const QJsonValue& audience, const QVector<QString>& audiences)
+{
+    return std::any_of(audiences.begin(), audiences.end(), [&](const QString& each) {
+        return audience.isArray() ? audience.toArray().contains(each) : audience == each;
+    });
+}
+
+}  // namespace
+
 QJsonValue claimOf(const QJsonObject& claims, const QString& path)
 {
     // Providers name claims by addresses, with points in them.
@@ -35,21 +62,12 @@ QJsonValue claimOf(const QJsonObject& claims, const QString& path)
     return value;
 }
 
-bool holds(const QJsonValue& claim, const QString& value)
+bool claimHolds(const QJsonValue& claim, const QString& value)
 {
     if (claim.isArray())
         return claim.toArray().contains(value);
     return claim.isString() && claim.toString().split(QLatin1Char(' ')).contains(value);
 }
-
-bool isMeantFor(const QJsonValue& audience, const QVector<QString>& audiences)
-{
-    return std::any_of(audiences.begin(), audiences.end(), [&](const QString& each) {
-        return audience.isArray() ? audience.toArray().contains(each) : audience == each;
-    });
-}
-
-}  // namespace
 
 QByteArray faultOfClaims(const QJsonObject& claims, const TokenRules& rules, std::chrono::seconds now,
                          std::chrono::seconds& until)
@@ -74,17 +92,23 @@ QByteArray faultOfClaims(const QJsonObject& claims, const TokenRules& rules, std
     return {};
 }
 
-bool callerOfClaims(const QJsonObject& claims, const TokenRules& rules, Caller& caller)
+QByteArray callerOfClaims(const QJsonObject& claims, const TokenRules& rules, Caller& caller)
 {
+    Caller made;
+    Kxg::StudyLimits limits;
     const QString subject = claimOf(claims, rules.subject).toString();
     if (subject.isEmpty() || subject.size() > kLongestSubject)
-        return false;
-    caller.subject = subject.toUtf8();
-    caller.rights = {};
+        return "The token names nobody";
+    if (!limitsOf(claims, rules, limits))
+        return "The token is for too many studies";
+    made.subject = subject.toUtf8();
     for (const ClaimRule& rule : rules.rights)
-        if (rule.claim.isEmpty() || holds(claimOf(claims, rule.claim), rule.value))
-            caller.rights |= rule.gives;
-    return true;
+        if (rule.claim.isEmpty() || claimHolds(claimOf(claims, rule.claim), rule.value))
+            made.rights |= rule.gives;
+    if (!limits.all.empty())
+        made.studies = std::make_shared<const Kxg::StudyLimits>(std::move(limits));
+    caller = made;
+    return {};
 }
 
 }  // namespace Kdd::Access

@@ -97,6 +97,7 @@ Http::Response BrowserService::config(const Http::Request& request) const
             may.append(QString::fromLatin1(right));
     return jsonAnswer(request, {{QStringLiteral("dicomWeb"), QString::fromUtf8(mSettings.dicomWeb)},
                                 {QStringLiteral("viewer"), mSettings.hasViewer},
+                                {QStringLiteral("signIn"), mSettings.hasSignIn},
                                 {QStringLiteral("thumbnails"), mSettings.hasThumbnails},
                                 {QStringLiteral("may"), may},
                                 {QStringLiteral("caller"), QString::fromUtf8(request.caller)}});

@@ -14,6 +14,7 @@ struct BrowserSettings
 {
     QByteArray dicomWeb = "dicom-web";  ///< where DICOMweb stands, without "/" at either end
     bool hasViewer = false;             ///< a viewer stands under "viewer/"
+    bool hasSignIn = false;             ///< people sign in under "signin", and out under "signout"
     bool hasThumbnails = false;         ///< DICOMweb renders images that have no stored preview
     QVector<QByteArray> changes;        ///< rights that are of use on this server, beside "read"
 };

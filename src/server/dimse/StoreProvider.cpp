@@ -42,6 +42,8 @@ Told toldOf(ArrivalFault fault)
         return {0xA900, "The dataset is of another class or instance"};
     case ArrivalFault::OtherStudy:
         return {0xA900, "The dataset is of another study"};
+    case ArrivalFault::NotAllowed:
+        return {0x0124, "Whoever sent it may not store it"};
     case ArrivalFault::OtherContent:
         return {0x0111, "There is another object of this SOP Instance UID"};
     case ArrivalFault::Failed:

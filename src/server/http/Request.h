@@ -3,6 +3,13 @@
 #include <QByteArray>
 #include <QVector>
 
+#include <memory>
+
+namespace Kxg
+{
+struct StudyLimits;
+}
+
 namespace Kdd::Http
 {
 
@@ -32,6 +39,7 @@ struct Request
     QByteArray
         certificate;  ///< whom the certificate that the peer showed names, "CN=...,O=..."; empty: none was
     QByteArray id;    ///< of this request, in logs and in the answer's X-Request-Id
+    std::shared_ptr<const Kxg::StudyLimits> studies;  ///< that whoever asks may see; null: all
 
     // As those know who let it in:
 

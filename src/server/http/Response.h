@@ -26,6 +26,13 @@ public:
     virtual Result next(QByteArray& block) = 0;
 };
 
+/// What a request changed, for those who keep trails: which studies, and how much of them. Never values.
+struct Effect
+{
+    QVector<QByteArray> studies;
+    int images = 0;
+};
+
 struct Response;
 
 /// Takes the body of a request block by block, as fast as it can, and then answers. It goes without having been asked for
@@ -40,13 +47,9 @@ public:
 
     /// The answer, once the body has come whole or no more of it is wanted.
     virtual Response answer() = 0;
-};
 
-/// What a request changed, for those who keep trails: which studies, and how much of them. Never values.
-struct Effect
-{
-    QVector<QByteArray> studies;
-    int images = 0;
+    /// What was changed so far, where the answer does not tell or does not come.
+    virtual std::optional<Effect> effect() const { return std::nullopt; }
 };
 
 /// What an answer consists of, in this order. Its length is known unless there is a producer, and is then sent.

@@ -197,6 +197,7 @@ void Session::prepareRequest()
     mBegan = Clock::now();
     mRequest = mReader.take();
     mCaller.clear();
+    mChanged.clear();
     mRequest.peer = mPeer;
     mRequest.isEncrypted = qstrcmp(mTransport->scheme(), "https") == 0;
     mRequest.certificate = mTransport->peerName();
@@ -326,10 +327,11 @@ void Session::report(bool isWhole)
 /// The client went before its request was whole.
 void Session::reportBrokenOff()
 {
+    const std::optional<Effect> effect = mSink != nullptr ? mSink->effect() : std::nullopt;
     mSink.reset();
     --mHost.inFlight;
     const auto duration = std::chrono::duration_cast<std::chrono::microseconds>(Clock::now() - mBegan);
-    mHost.observer.ended({mRequest, mCaller, {}, 400, 0, duration, false, {}});
+    mHost.observer.ended({mRequest, mCaller, effect, 400, 0, duration, false, {}});
     mRequest = {};
 }
 

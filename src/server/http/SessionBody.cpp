@@ -151,6 +151,8 @@ bool Session::isTooSlow() const
 
 void Session::endBody(Response response, Afterwards afterwards)
 {
+    if (mSink != nullptr && !response.effect)
+        response.effect = mSink->effect();
     mSink.reset();
     response.headers += mHeaders;
     // From here on the client waits.

@@ -137,6 +137,9 @@ bool trustClients(SSL_CTX* context, const QByteArray& caFile)
 /// TLS 1.3 has no other ones.
 constexpr const char* kCiphers = "ECDHE+AESGCM:ECDHE+CHACHA20";
 
+/// That may be taken up again, with some kilobyte each.
+constexpr long kMostSessions = 2000;
+
 }  // namespace
 
 struct TlsContext::Private
@@ -175,7 +178,10 @@ std::unique_ptr<TlsContext> TlsContext::make(const QByteArray& certificateFile, 
     // Connections that rest give their buffers back. Writes go on with what did not fit, from wherever it lies then.
     SSL_CTX_set_mode(context, SSL_MODE_RELEASE_BUFFERS | SSL_MODE_ENABLE_PARTIAL_WRITE |
                                   SSL_MODE_ACCEPT_MOVING_WRITE_BUFFER);
-    SSL_CTX_set_options(context, SSL_OP_NO_RENEGOTIATION | SSL_OP_NO_COMPRESSION);
+    // Sessions that are taken up again are kept here and not in tickets of the client: one key would open all of those, for as
+    // long as the process lives, with what was said in them.
+    SSL_CTX_set_options(context, SSL_OP_NO_RENEGOTIATION | SSL_OP_NO_COMPRESSION | SSL_OP_NO_TICKET);
+    SSL_CTX_sess_set_cache_size(context, kMostSessions);
     return made;
 }
 

@@ -117,7 +117,8 @@ protected:
     std::string changes(qint64 after = 0)
     {
         std::vector<StudyChangeNote> noted;
-        EXPECT_EQ(search().changes(after, 100, noted).text().toStdString(), "");
+        qint64 last = 0;
+        EXPECT_EQ(search().changes(after, 100, noted, last).text().toStdString(), "");
         QByteArray text;
         for (const StudyChangeNote& each : noted)
             text += QByteArray::number(each.position) + "ACMD"[static_cast<int>(each.kind) - 1] +
@@ -167,6 +168,71 @@ TEST_P(StudySearchTest, ARangeOfDatesAndTimesIsOneOfMoments)
     };
     EXPECT_EQ(from("093000.000000"), "1");
     EXPECT_EQ(from("100001.000000"), "");
+}
+
+TEST_P(StudySearchTest, FindsNothingBeyondItsLimits)
+{
+    const QByteArray north = R"(00080080{"Value":["North"],"vr":"LO"})";
+    const QByteArray south = R"(00080080{"Value":["South"],"vr":"LO"})";
+    const QByteArray lines[][2] = {{north, north}, {north, ""}, {north, south}, {"", ""}, {south, south}};
+    for (int i = 0; i < 5; ++i) {
+        const QByteArray uid = QByteArray::number(i);
+        StudySearchRecord study = aStudy("A", "20240101", ("P" + uid).constData(), {"CT", "SR"});
+        study.attributes = i == 3 ? QByteArray(R"(00100020{"Value":["P\n00080080"],"vr":"LO"})") + '\n' : "";
+        for (std::size_t s = 0; s < 2; ++s)
+            study.series[s].attributes = lines[i][s].isEmpty() ? QByteArray() : lines[i][s] + '\n';
+        build(uid.constData(), study);
+    }
+    using Of = StudyLimit::Of;
+    const struct
+    {
+        std::vector<StudyLimit> all;
+        const char* studies;
+    } kLimits[] = {
+        {{{Of::Series, "00080080", {north}}}, "0 1"},
+        {{{Of::Series, "00080080", {"00080080{\"Value\":[\"x\"],\"vr\":\"LO\"}", north, south}}}, "0 1 2 4"},
+        {{{Of::Study, "00100020", {R"(00100020{"Value":["P\n00080080"],"vr":"LO"})"}}}, "3"},
+        {{{Of::Uid, "0020000D", {"1", "4", "7"}}}, "1 4"},
+        {{{Of::Uid, "0020000D", {"1", "4"}}, {Of::Series, "00080080", {north}}}, "1"},
+        {{{Of::Uid, "0020000D", {}}}, ""},
+        {{{Of::Series, "00080080", {"%"}}}, ""},
+    };
+    for (const auto& each : kLimits) {
+        search().limitTo(std::make_shared<StudyLimits>(StudyLimits{each.all}));
+        const std::string expected = each.studies;
+        EXPECT_EQ(find({}), expected);
+        EXPECT_EQ(find({oneOf(SearchColumn::ModalitiesInStudy, {"CT"})}), expected);
+        EXPECT_EQ(find({oneOf(SearchColumn::Modality, {"SR"})}), expected);
+        std::vector<FoundPatient> patients;
+        std::vector<FoundSeries> series;
+        EXPECT_TRUE(search().patients({}, patients).good() && search().series({}, series).good());
+        EXPECT_EQ(patients.size(), (expected.size() + 1) / 2);
+        EXPECT_EQ(series.size(), 2 * patients.size());
+        std::string seen;
+        for (const char uid : expected)
+            seen += uid == ' ' ? "" : std::to_string(uid - '0' + 1) + 'A' + uid + ' ';
+        EXPECT_EQ(changes(), seen);
+    }
+    search().limitTo(nullptr);
+    EXPECT_EQ(find({}), "0 1 2 3 4");
+}
+
+TEST_P(StudySearchTest, GoesPastChangesThatMayNotBeSeen)
+{
+    for (const char* uid : {"1", "2", "3", "4"})
+        build(uid, aStudy("A", "20240101", uid, {"CT"}));
+    search().limitTo(
+        std::make_shared<StudyLimits>(StudyLimits{{{StudyLimit::Of::Uid, "0020000D", {"2", "3"}}}}));
+    std::vector<StudyChangeNote> noted;
+    qint64 last = 0;
+    for (const qint64 position : {2, 3}) {
+        ASSERT_TRUE(search().changes(last, 1, noted, last).good());
+        EXPECT_EQ(last, position);
+        EXPECT_EQ(noted.size(), 1U);
+    }
+    ASSERT_TRUE(search().changes(last, 1, noted, last).good());
+    EXPECT_EQ(last, 4);
+    EXPECT_EQ(noted.size(), 0U);
 }
 
 TEST_P(StudySearchTest, PagesFollowEachOtherInEveryOrder)
@@ -290,9 +356,11 @@ TEST_P(StudySearchTest, WhoFollowsTheChangesMissesNone)
         std::vector<StudyChangeNote> noted;
         for (bool isLast = false; !isLast || !noted.empty();) {
             isLast = writing == 0;  // asked before, so that the last look comes after the last change
-            EXPECT_TRUE(follower->changes(last, 3, noted).good());
+            qint64 position = last;
+            EXPECT_TRUE(follower->changes(last, 3, noted, position).good());
             for (const StudyChangeNote& each : noted)
                 EXPECT_EQ(each.position, ++last);
+            EXPECT_EQ(position, last);
         }
     });
     EXPECT_EQ(last, kWriters * kStudies);

@@ -28,7 +28,12 @@ public:
         QByteArray names;
         for (const Http::Field& field : request.headers)
             names += field.name + ' ';
-        return Http::textResponse(200, "text/plain", names);
+        Http::Response response = Http::textResponse(200, "text/plain", names);
+        if (request.path.size() > 2)
+            response.addHeader("Study", request.path[2]);
+        if (request.method == Http::Method::Options && request.path.last() != "series")
+            response.addHeader("Allow", request.path.last() == "studies" ? "GET, POST" : "GET");
+        return response;
     }
 };
 
@@ -48,7 +53,8 @@ protected:
         Inside inside;
         Http::Request request = mRequest;
         request.headers = headers;
-        return AccessGate(mRules, RightsTable({"dicom-web"}), {"10.0.0.9"}, inside).answer(request);
+        return AccessGate(mRules, RightsTable({"dicom-web"}), {"10.0.0.9"}, mLook, nullptr, inside)
+            .answer(request);
     }
     int status(const QVector<Http::Field>& headers = {}) { return answer(headers).status; }
 
@@ -70,6 +76,7 @@ protected:
     }
 
     AccessRules mRules;
+    AccessGate::Look mLook;
     Http::Request mRequest;
 };
 
@@ -113,7 +120,44 @@ TEST_F(AccessGateTest, RefusesWhatStandsInNoTable)
     for (const char* path : {"dicom-web/changefeed", "browser/config"})
         EXPECT_EQ(statusFor(kAllRights, Http::Method::Post, path), 405) << path;
     EXPECT_EQ(statusFor(kAllRights, Http::Method::Other, "dicom-web/studies"), 405);
+    EXPECT_EQ(headerOf(answer(), "Allow"), "GET, POST") << "what the path has, and no other";
+    EXPECT_EQ(statusFor(kAllRights, Http::Method::Other, "dicom-web/series"), 404);
     EXPECT_EQ(statusFor({}, Http::Method::Get, "dicom-web/made-up"), 403);
+}
+
+TEST_F(AccessGateTest, AsksForAStudyThatIsNotThereInPlaceOfAHiddenOne)
+{
+    const TokenIssuer issuer;
+    const QTemporaryDir folder;
+    putFile(folder.filePath(QStringLiteral("keys")), issuer.keySet());
+    ASSERT_EQ(
+        AccessRules::parse(
+            R"({"tokens":{"issuer":"https://login.example","audience":"archive","rights":[{"gives":["read"]}],)"
+            R"("studies":[{"claim":"s","attribute":"StudyID"}],"keys":")" +
+                folder.filePath(QStringLiteral("keys")).toUtf8() + "\"}}",
+            mRules)
+            .text(),
+        QString());
+    const Http::Field token = {"authorization",
+                               "Bearer " + issuer.token(TokenIssuer::claimsWith("exp", 2 * kNow))};
+    mRequest.path = {"dicom-web", "studies", "1.2", "metadata"};
+    const struct
+    {
+        DicomWeb::Sight sight;
+        int status;
+        bool isNamed;
+    } kSights[] = {{DicomWeb::Sight::Seen, 200, true},
+                   {DicomWeb::Sight::Hidden, 200, false},
+                   {DicomWeb::Sight::Unknown, 503, false}};
+    for (const auto& each : kSights) {
+        mLook = [&](const auto&, const QByteArray& study) {
+            EXPECT_EQ(study, "1.2");
+            return each.sight;
+        };
+        const Http::Response response = answer({token});
+        EXPECT_EQ(response.status, each.status);
+        EXPECT_EQ(headerOf(response, "Study") == "1.2", each.isNamed);
+    }
 }
 
 TEST_F(AccessGateTest, BelievesNamesOfNamedPeersOnly)

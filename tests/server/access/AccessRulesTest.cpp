@@ -76,6 +76,15 @@ TEST(AccessRules, OpenNoDoorByASlip)
         {R"({"anyone":["read"],"cors":{"origins":["null"]}})",
          "cors.origins has something that is no origin"},
         {R"({"anyone":["read"],"cors":{"origins":["https://a/b"]}})", "cors.origins has something"},
+        {R"({"anyone":["read"],"signIn":{"client":"c","sessionKeys":"k"}})", "signIn needs tokens"},
+        {tokens + R"(},"signIn":{"sessionKeys":"k"}})", "signIn.client is no text"},
+        {tokens + R"(},"signIn":{"client":"c"}})", "signIn.sessionKeys is no text"},
+        {tokens + R"(},"signIn":{"client":"c","sessionKeys":"k","scope":"profile"}})", "signIn.scope lacks"},
+        {tokens + R"(},"signIn":{"client":"c","sessionKeys":"k","session":5}})",
+         "signIn.session is no number"},
+        {R"({"anyone":["read"],"syslog":{"to":"tcp://a"}})", "syslog.to is no receiver"},
+        {R"({"anyone":["read"],"syslog":{"to":"tls://a/b"}})", "syslog.to is no receiver"},
+        {R"({"anyone":["read"],"syslog":{"to":"unix:log"}})", "syslog.to is no receiver"},
     };
     for (const auto& each : kFiles) {
         AccessRules rules;
@@ -84,6 +93,34 @@ TEST(AccessRules, OpenNoDoorByASlip)
             << each.text.toStdString() << ": " << result.text().toStdString();
         EXPECT_FALSE(rules.anyone || rules.tokens || rules.header || rules.certificates);
     }
+}
+
+TEST(AccessRules, SayWhereMessagesGoAndPeopleSignIn)
+{
+    AccessRules rules;
+    const QByteArray begin =
+        QByteArray(R"({"tokens":{)") + kTokens + R"(},"signIn":{"client":"c","sessionKeys":"k"},)";
+    const struct
+    {
+        const char* to;
+        SyslogRules::By by;
+        const char* host;
+        const char* port;
+    } kReceivers[] = {
+        {"tls://Audit.example", SyslogRules::By::Tls, "audit.example", "6514"},
+        {"tls://audit.example:1234", SyslogRules::By::Tls, "audit.example", "1234"},
+        {"udp://[::1]", SyslogRules::By::Udp, "::1", "514"},
+        {"udp://[0::1]:99", SyslogRules::By::Udp, "::1", "99"},
+        {"unix:/dev/log", SyslogRules::By::Socket, "/dev/log", ""},
+    };
+    for (const auto& each : kReceivers) {
+        ASSERT_EQ(AccessRules::parse(begin + R"("syslog":{"to":")" + each.to + "\"}}", rules).text(),
+                  QString());
+        EXPECT_EQ(rules.syslog->by, each.by) << each.to;
+        EXPECT_EQ(rules.syslog->host, each.host) << each.to;
+        EXPECT_EQ(rules.syslog->port, each.port) << each.to;
+    }
+    EXPECT_TRUE(rules.signIn->discovery.endsWith("/.well-known/openid-configuration"));
 }
 
 TEST(AccessRules, NameTheFileThatIsNotThere)

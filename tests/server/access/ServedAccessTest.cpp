@@ -215,4 +215,44 @@ TEST_F(ServedAccess, SpeaksNoOldTls)
     }
 }
 
+/// By the eyes of another program.
+TEST_F(ServedAccess, KeepsTlsToTodaysPractice)
+{
+    useTls();
+    start();
+    const auto said = [&](const char* arguments, const QByteArray& typed) {
+        QProcess process;
+        process.setProcessChannelMode(QProcess::MergedChannels);
+        process.start(QStringLiteral("openssl"),
+                      QString::fromLatin1("s_client -connect " + mServer->address().mid(8) + ' ' + arguments)
+                          .split(QLatin1Char(' ')));
+        process.write(typed);
+        process.closeWriteChannel();
+        EXPECT_TRUE(process.waitForFinished(60000));
+        return process.readAll();
+    };
+    const struct
+    {
+        const char* arguments;
+        const char* typed;
+        const char* contains;
+        bool does;
+    } kTalks[] = {
+        {"-tls1_2", "", "Server Temp Key: X25519", true},
+        {"-tls1_2", "", "TLS session ticket", false},
+        {"-tls1_2", "", "Secure Renegotiation IS supported", true},
+        {"-tls1_2", "R\n", "no renegotiation", true},
+        {"-tls1_2", "", "Compression: NONE", true},
+        {"-tls1_2 -cipher kRSA:aNULL:DHE:ECDHE+SHA1@SECLEVEL=0", "", "handshake failure", true},
+        {"-tls1_3", "", "Cipher is TLS_AES_256_GCM_SHA384", true},
+        {"-tls1_1 -cipher ALL@SECLEVEL=0", "", "protocol version", true},
+        {"-no_tls1_3 -cipher ECDHE+CHACHA20", "", "Cipher is ECDHE-ECDSA-CHACHA20-POLY1305", true},
+    };
+    for (const auto& each : kTalks) {
+        const QByteArray text = said(each.arguments, each.typed);
+        EXPECT_EQ(text.contains(each.contains), each.does) << each.arguments << ": " << each.contains << '\n'
+                                                           << text.constData();
+    }
+}
+
 }  // namespace

@@ -338,4 +338,21 @@ TEST_F(StoreTest, TakesNothingUnlessItIsToldTo)
     EXPECT_EQ(store(anImage("1.2.3.1")).status, 405);
 }
 
+TEST_F(StoreTest, TellsTheTrailWhichStudiesItChanged)
+{
+    mSettings.access = Access::AccessRules::open();
+    mSettings.access->audit = mStore.filePath("audit.jsonl").toUtf8();
+    start();
+    const QByteArray parts = partOf(fileOf(anImage("1.2.3.1"))) +
+                             partOf(fileOf(anImage("5.1").inStudy("5"))) +
+                             partOf(fileOf(anImage("1.2.3.2"))) + partOf("Doe^John");
+    EXPECT_EQ(post(parts + "--cut--").status, 202);
+    EXPECT_EQ(store(anImage("1.2.3.1")).status, 200);
+    mServer.reset();
+    const QList<QByteArray> lines = fileContent(mStore.filePath("audit.jsonl")).split('\n');
+    EXPECT_TRUE(lines[0].contains(R"("studies":["1.2","5"])")) << lines[0].constData();
+    EXPECT_FALSE(lines[1].contains("studies\":")) << "nothing was changed";
+    EXPECT_FALSE(lines.join().contains("Doe"));
+}
+
 }  // namespace

@@ -13,12 +13,13 @@ namespace Kdd
 {
 
 ObjectBatch::ObjectBatch(const ObjectPlaces& places, ArrivedStudies& studies, FlushThreads& flushes,
-                         Kxg::Catalogue& catalogue, QByteArray studyUID)
+                         Kxg::Catalogue& catalogue, QByteArray studyUID, Admission admits)
     : mPlaces(places)
     , mStudies(studies)
     , mFlushes(flushes)
     , mCatalogue(catalogue)
     , mStudyUID(std::move(studyUID))
+    , mAdmits(std::move(admits))
     , mCanLock(mLocks.open(places.objectLocks()))
 {
 }
@@ -33,10 +34,19 @@ void ObjectBatch::add(StagedFile& file, ArrivalFault fault, const QString& reaso
         refuse(entry.object, fault, reason);
         return;
     }
-    if (ObjectPlaces::check(entry.input, mStudyUID, entry.object) && lock(entry) &&
-        mPlaces.settleWithKnown(entry.input, mCatalogue, entry.object) &&
+    if (check(entry) && lock(entry) && mPlaces.settleWithKnown(entry.input, mCatalogue, entry.object) &&
         mPlaces.place(file, entry.input, entry.object))
         beginFlush(entry);
+}
+
+bool ObjectBatch::check(Entry& entry) const
+{
+    if (!ObjectPlaces::check(entry.input, mStudyUID, entry.object))
+        return false;
+    if (mAdmits && !mAdmits(*entry.input.map))
+        refuse(entry.object, ArrivalFault::NotAllowed,
+               QStringLiteral("Whoever sent it may not store into such studies"));
+    return entry.object.isStored();
 }
 
 /// The right to decide about the object. Nobody waits for it while he has others, or two would wait for each other.

@@ -5,6 +5,7 @@
 #include "platform/os/NamedLocks.h"
 
 #include <deque>
+#include <functional>
 
 namespace Kdd
 {
@@ -16,9 +17,12 @@ class ArrivedStudies;
 class ObjectBatch
 {
 public:
-    /// All but the UID outlive the object. With that not empty objects have to be of this study.
+    /// Whether an object may be stored, by its attributes; without it every one may.
+    using Admission = std::function<bool(const TagMap& image)>;
+
+    /// All but the last two outlive the object. With the UID not empty objects have to be of this study.
     ObjectBatch(const ObjectPlaces& places, ArrivedStudies& studies, FlushThreads& flushes,
-                Kxg::Catalogue& catalogue, QByteArray studyUID);
+                Kxg::Catalogue& catalogue, QByteArray studyUID, Admission admits);
 
     /// Reads and checks one that was received, or refused by then, gives it its place and begins to wait for the disk. The
     /// file outlives the object.
@@ -36,6 +40,7 @@ private:
         std::future<SystemResult> flushed;
     };
 
+    bool check(Entry& entry) const;
     bool lock(Entry& entry);
     void beginFlush(Entry& entry);
     void settle();
@@ -47,6 +52,7 @@ private:
     FlushThreads& mFlushes;
     Kxg::Catalogue& mCatalogue;
     const QByteArray mStudyUID;
+    const Admission mAdmits;
     NamedLocks mLocks;
     SystemResult mCanLock;
     std::deque<Entry> mEntries;

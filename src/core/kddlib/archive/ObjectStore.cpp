@@ -175,9 +175,10 @@ std::unique_ptr<ObjectArrival> ObjectStore::begin()
 }
 
 std::vector<ArrivedObject> ObjectStore::commit(std::vector<std::unique_ptr<ObjectArrival>>& arrivals,
-                                               Kxg::Catalogue& catalogue, const QByteArray& studyUID)
+                                               Kxg::Catalogue& catalogue, const QByteArray& studyUID,
+                                               const Admission& admits)
 {
-    ObjectBatch batch(d->places, d->studies, d->flushes, catalogue, studyUID);
+    ObjectBatch batch(d->places, d->studies, d->flushes, catalogue, studyUID, admits);
     for (const auto& arrival : arrivals)
         batch.add(arrival->d->file, arrival->d->fault, arrival->d->reason);
     return batch.finish();

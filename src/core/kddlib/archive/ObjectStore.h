@@ -6,6 +6,7 @@
 #include <QByteArray>
 #include <QString>
 
+#include <functional>
 #include <memory>
 #include <vector>
 
@@ -19,6 +20,7 @@ namespace Kdd
 
 class ArrivedStudies;
 class StagedFile;
+class TagMap;
 
 /// What becomes of an object whose SOP Instance UID the study has with other content.
 enum class SameUid {
@@ -43,6 +45,7 @@ enum class ArrivalFault {
     Mismatch,      ///< meta information and dataset name different objects
     OtherStudy,    ///< than the one it was sent to
     OtherContent,  ///< the study has another object of this UID
+    NotAllowed,    ///< whoever sent it may not store it
     Failed,        ///< the database or the disk; it may be sent again
 };
 
@@ -111,11 +114,15 @@ public:
     /// Begins to receive an object; also when it cannot be received, which committing will tell.
     std::unique_ptr<ObjectArrival> begin();
 
+    /// Whether whoever sent an image may store it; none: he may.
+    using Admission = std::function<bool(const TagMap& image)>;
+
     /// Stores objects that have come whole, what costs a wait for disk or database for all of them at once, and tells of each
     /// what became of it. With `studyUID` not empty they have to be of that study. In this order: headers are read and
     /// checked, the files get their places, all of that is flushed, they are registered.
     std::vector<ArrivedObject> commit(std::vector<std::unique_ptr<ObjectArrival>>& arrivals,
-                                      Kxg::Catalogue& catalogue, const QByteArray& studyUID = {});
+                                      Kxg::Catalogue& catalogue, const QByteArray& studyUID = {},
+                                      const Admission& admits = {});
 
     /// Looks after what servers left that died: what was whole is taken in, the rest goes. Failure: that of the database.
     Result recover(Kxg::Catalogue& catalogue);

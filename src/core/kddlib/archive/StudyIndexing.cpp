@@ -5,9 +5,12 @@
 #include "kddlib/tagfile/SearchAttributes.h"
 #include "kddlib/tagfile/StudyRecord.h"
 #include "kddlib/tagfile/TagFile.h"
+#include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
 #include "platform/os/FileStatus.h"
 #include "platform/os/PathName.h"
+
+#include <algorithm>
 
 namespace Kdd
 {
@@ -45,6 +48,26 @@ bool StudyIndexing::isStudyAttribute(const DcmTagKey& key)
 bool StudyIndexing::isSeriesAttribute(const DcmTagKey& key)
 {
     return isKeptOfSeries(key);
+}
+
+StudyIndexing::Standing StudyIndexing::standingOf(const TagMap& image, const Kxg::StudyLimits& limits)
+{
+    const Kxg::StudySearchRecord study = searchRecord({{image.uid(TagMap::ImageLevel), &image}});
+    Standing standing = Standing::Within;
+    for (const Kxg::StudyLimit& limit : limits.all) {
+        const bool isOfSeries = limit.of == Kxg::StudyLimit::Of::Series;
+        const QByteArray& lines = isOfSeries ? study.series.front().attributes : study.attributes;
+        const bool isUid = limit.of == Kxg::StudyLimit::Of::Uid;
+        const bool holds =
+            isUid ? limit.values.contains(image.uid(TagMap::StudyLevel))
+                  : std::any_of(limit.values.begin(), limit.values.end(),
+                                [&](const QByteArray& line) { return lines.contains(line + '\n'); });
+        if (!holds && (isUid || lines.contains(limit.attribute + '{')))
+            return Standing::Beyond;
+        if (!holds)
+            standing = Standing::Silent;
+    }
+    return standing;
 }
 
 int StudyIndexing::refresh(const std::vector<const Kxg::FoundStudy*>& studies)

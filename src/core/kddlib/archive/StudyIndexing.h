@@ -14,6 +14,7 @@ namespace Kdd
 {
 
 class TagFile;
+class TagMap;
 class WorkObserver;
 
 /// Keeps what searches know of studies in line with their tag files. Whoever writes a tag file under the study's claim
@@ -35,6 +36,15 @@ public:
     /// Whether answers of studies, or of series, have the attribute from the database.
     static bool isStudyAttribute(const DcmTagKey& key);
     static bool isSeriesAttribute(const DcmTagKey& key);
+
+    /// What an image says to limits by itself.
+    enum class Standing {
+        Within,
+        Silent,  ///< it has not all that they ask for, but no other value either
+        Beyond,
+    };
+
+    static Standing standingOf(const TagMap& image, const Kxg::StudyLimits& limits);
 
     /// Reads the tag files of those studies that are not and takes over what they show. How many studies differ now; a
     /// tag file that cannot be read is told in the log and leaves what was known.

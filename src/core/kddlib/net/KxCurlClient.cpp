@@ -291,18 +291,24 @@ QJsonDocument KxCurlClient::readJson(const std::string& url, KxHttpStatus& statu
     return QJsonDocument::fromJson(readBytes(url, status));
 }
 
-Result KxCurlClient::readTrusted(const std::string& url, const QByteArray& caFile, qint64 most,
-                                 std::chrono::milliseconds patience, QByteArray& body)
+Result KxCurlClient::askTrusted(const std::string& url, const QByteArray& caFile,
+                                const std::vector<std::string>& headers, const QByteArray* form, qint64 most,
+                                std::chrono::milliseconds patience, QByteArray& body)
 {
     const WebOrigin origin = originOf(url);
     if (!origin.isValid() || (origin.scheme == "http" && !isThisMachine(origin.host)))
         return Result::failure(QStringLiteral("it is no address of HTTPS"))
             .within(QString::fromStdString(url));
     try {
-        KxCurlRequest request(mPrivate->ownHandles, mPrivate->share, url, "GET");
+        KxCurlRequest request(mPrivate->ownHandles, mPrivate->share, url, form != nullptr ? "POST" : "GET");
         request.demandProof(caFile);
         request.setBounds(most, patience);
-        request.perform();
+        for (const std::string& header : headers)
+            request.addHeader(header);
+        if (form != nullptr)
+            request.perform(*form);
+        else
+            request.perform();
         if (request.status().code != kOk)
             return Result::failure(QString::fromStdString(request.status().reason().empty()
                                                               ? "it is elsewhere"

@@ -1,6 +1,7 @@
 #pragma once
 
 #include "platform/base/Export.h"
+#include "platform/base/Result.h"
 
 #include <QByteArray>
 
@@ -16,7 +17,6 @@ namespace Kdd
 
 class KxCurlDownloadStream;
 class KxCurlUploadStream;
-class Result;
 struct KxHttpStatus;
 
 /// The one way by which the library reads and writes over HTTP and HTTPS.
@@ -98,7 +98,18 @@ public:
     /// the certificates in `caFile` (PEM), or when that is empty those of the settings or the system; plain HTTP is for this machine
     /// alone. No session is told and no redirect followed. A failure, with `body` as it was, also for any code but 200.
     Result readTrusted(const std::string& url, const QByteArray& caFile, qint64 most,
-                       std::chrono::milliseconds patience, QByteArray& body);
+                       std::chrono::milliseconds patience, QByteArray& body)
+    {
+        return askTrusted(url, caFile, {}, nullptr, most, patience, body);
+    }
+
+    /// The same for what is posted to such a server, with these header lines.
+    Result postTrusted(const std::string& url, const QByteArray& caFile,
+                       const std::vector<std::string>& headers, const QByteArray& form, qint64 most,
+                       std::chrono::milliseconds patience, QByteArray& body)
+    {
+        return askTrusted(url, caFile, headers, &form, most, patience, body);
+    }
 
     /// Sends a body, also an empty one, and returns the answer as JSON; a null document when it is none.
     QJsonDocument postBytes(const std::string& url, const QByteArray& body, const std::string& contentType,
@@ -124,6 +135,10 @@ private:
     friend class KxGoogleAuth;
     struct Private;
     KxCurlClient();
+
+    Result askTrusted(const std::string& url, const QByteArray& caFile,
+                      const std::vector<std::string>& headers, const QByteArray* form, qint64 most,
+                      std::chrono::milliseconds patience, QByteArray& body);
 
     /// As postBytes, but the session is none of the server's business.
     QJsonDocument postWithoutSession(const std::string& url, const QByteArray& body,

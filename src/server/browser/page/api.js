@@ -1,5 +1,7 @@
 // What the page asks of the server. All addresses are relative to the page, so that it works behind any prefix.
 
+import { leaveToSignIn } from './session.js';
+
 /** Why there is no answer: "offline", "absent", "busy", "gone" (nobody waits for it any more) or "failed". */
 export class Failure extends Error {
   constructor(kind, message) {
@@ -26,6 +28,7 @@ async function ask(address, accept, signal) {
     if (signal?.aborted) throw new Failure('gone', 'No longer wanted');
     throw new Failure('offline', 'The server cannot be reached.');
   }
+  if (response.status === 401 && leaveToSignIn(response.headers.get('X-Sign-In'))) throw new Failure('gone', 'Signing in');
   if (!response.ok) throw new Failure(kinds[response.status] ?? 'failed', await reasonOf(response));
   if (response.status === 204) return null;
   try {
@@ -36,7 +39,7 @@ async function ask(address, accept, signal) {
   }
 }
 
-export const config = { dicomWeb: 'dicom-web', viewer: false, thumbnails: false, may: [], caller: '' };
+export const config = { dicomWeb: 'dicom-web', viewer: false, thumbnails: false, signIn: false, may: [], caller: '' };
 
 export async function readConfig(signal) {
   Object.assign(config, await ask('browser/config', 'application/json', signal));

@@ -16,6 +16,7 @@ import { correctionsView } from './corrections.js';
 import { differenceView } from './difference.js';
 import { imageView } from './image.js';
 import { removeView } from './remove.js';
+import { returnToPlace } from './session.js';
 import { studyView } from './study.js';
 import { volumesView } from './volumes.js';
 
@@ -125,5 +126,6 @@ addEventListener('online', () => {
 offline.hidden = navigator.onLine;
 
 // Without it the page is whole but for links to what else the server has.
+returnToPlace();
 await readConfig().catch(() => config);
 show();

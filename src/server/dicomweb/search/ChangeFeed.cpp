@@ -51,8 +51,11 @@ QByteArray jsonOf(const Kxg::StudyChangeNote& change)
                       nameOf(change.kind) + "\",\"study\":" + jsonText(change.studyInstanceUID) +
                       ",\"instances\":" + QByteArray::number(change.instances) +
                       ",\"time\":" + jsonText(at.toString(Qt::ISODateWithMs).toLatin1());
-    if (change.kind == Kxg::ChangeKind::Moved)
-        json += ",\"from\":" + jsonText(change.movedFrom) + ",\"to\":" + jsonText(change.movedTo);
+    // Of one that the client may not see there is no name.
+    if (!change.movedFrom.isEmpty())
+        json += ",\"from\":" + jsonText(change.movedFrom);
+    if (!change.movedTo.isEmpty())
+        json += ",\"to\":" + jsonText(change.movedTo);
     return json + '}';
 }
 
@@ -72,14 +75,16 @@ Http::Response ChangeFeed::answer(const Http::Request& request, const ResourcePa
         !takeNumber(request, "limit", kGreatestLimit, limit))
         return Http::failure(400, QStringLiteral("after and limit are whole numbers"));
     std::vector<Kxg::StudyChangeNote> changes;
-    const Result result = mDatabase.ask(
-        [&](Kxg::StudySearch& search) { return search.changes(after, static_cast<int>(limit), changes); });
+    qint64 last = after;
+    const Result result = mDatabase.ask(request.studies, [&](Kxg::StudySearch& search) {
+        return search.changes(after, static_cast<int>(limit), changes, last);
+    });
     if (result.bad())
         return Http::failure(503, QStringLiteral("The image database cannot be asked now"));
     QByteArray body = "{\"changes\":[";
     for (const Kxg::StudyChangeNote& change : changes)
         body += (&change == &changes.front() ? "" : ",") + jsonOf(change);
-    body += "],\"last\":" + QByteArray::number(changes.empty() ? after : changes.back().position) + '}';
+    body += "],\"last\":" + QByteArray::number(last) + '}';
     Http::Response response = Http::textResponse(200, "application/json", body);
     Http::compress(request, response);
     return response;

@@ -67,16 +67,17 @@ Http::Response SearchResource::answer(const Http::Request& request, const Resour
     if (!SearchRequest::parse(request.query, search, reason) || !SearchPlan::make(search, plan, reason))
         return Http::failure(400, reason);
 
-    // Studies that have just come are known at once, but not what they consist of.
+    // Studies that have just come are known at once, but not what they consist of, nor all by which they may be seen.
     const bool isBelowStudies = search.level == SearchLevel::Series || search.level == SearchLevel::Instances;
-    if (isBelowStudies && mShelf.arrivals() != nullptr && path.study.isEmpty())
+    if (mShelf.arrivals() != nullptr && path.study.isEmpty() &&
+        (isBelowStudies || request.studies != nullptr))
         mShelf.arrivals()->bringInOwn({});
     else if (isBelowStudies && mShelf.arrivals() != nullptr)
         mShelf.arrivals()->bringIn(path.study);
 
     const QByteArray root = request.base;
     Http::Response response;
-    const Result result = mDatabase.ask([&](Kxg::StudySearch& database) {
+    const Result result = mDatabase.ask(request.studies, [&](Kxg::StudySearch& database) {
         FoundAnswers answers(search, root);
         SearchRun run(search, plan, database, mShelf);
         const Result done = run.run(answers);

@@ -1,7 +1,8 @@
 #include "server/dicomweb/search/SearchRun.h"
 
+#include "server/dicomweb/search/CurrentRows.h"
+
 #include <dcmtk/dcmdata/dcdeftag.h>
-#include <kddlib/StudyIndexing.h>
 #include <kddlib/TagFile.h>
 #include <kddlib/TagMap.h>
 
@@ -25,50 +26,6 @@ constexpr int kCounted = 100;
 
 constexpr int kRowsAtOnce = 1000;
 constexpr int kSeriesAtOnce = 500;
-
-// A study that is written again and again while it is looked at is answered as it was found last.
-constexpr int kRefreshes = 3;
-
-const Kxg::FoundStudy& studyOf(const Kxg::FoundStudy& study)
-{
-    return study;
-}
-
-const Kxg::FoundStudy& studyOf(const Kxg::FoundSeries& series)
-{
-    return series.study;
-}
-
-/// Those whose tag files are others now, each once.
-template <typename Found>
-std::vector<const Kxg::FoundStudy*> changedAmong(const std::vector<Found>& found)
-{
-    std::vector<const Kxg::FoundStudy*> changed;
-    QSet<int> seen;
-    for (const Found& each : found) {
-        const Kxg::FoundStudy& study = studyOf(each);
-        if (seen.contains(study.id))
-            continue;
-        seen.insert(study.id);
-        if (!StudyIndexing::isCurrent(study))
-            changed.push_back(&study);
-    }
-    return changed;
-}
-
-/// Asks until nothing that was found has changed since.
-template <typename Found, typename Ask>
-Result findCurrent(Kxg::StudySearch& search, std::vector<Found>& found, const Ask& ask)
-{
-    Result result = ask();
-    for (int i = 0; i < kRefreshes && result.good(); ++i) {
-        const std::vector<const Kxg::FoundStudy*> changed = changedAmong(found);
-        if (changed.empty() || StudyIndexing(search).refresh(changed) == 0)
-            break;
-        result = ask();
-    }
-    return result;
-}
 
 /// What all studies of a patient have alike.
 bool isOfPatient(const SearchCondition* condition)

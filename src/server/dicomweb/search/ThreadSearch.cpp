@@ -26,12 +26,15 @@ Result obtain(const QByteArray& address, Kxg::StudySearch*& search)
 
 }  // namespace
 
-Result ThreadSearch::ask(const std::function<Result(Kxg::StudySearch&)>& work) const
+Result ThreadSearch::ask(const std::shared_ptr<const Kxg::StudyLimits>& limits,
+                         const std::function<Result(Kxg::StudySearch&)>& work) const
 {
     Kxg::StudySearch* search = nullptr;
     Result result = obtain(mAddress, search);
-    if (result.good())
+    if (result.good()) {
+        search->limitTo(limits);
         result = work(*search);
+    }
     // A connection that is lost is opened anew by the next transaction, so the one that noticed the loss tries again.
     if (result.bad() && search != nullptr)
         result = work(*search);

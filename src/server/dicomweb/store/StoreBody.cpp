@@ -41,9 +41,10 @@ ArrivedObject refused(ArrivalFault fault, const QString& reason)
 
 }  // namespace
 
-StoreBody::StoreBody(ArrivalService& arrivals, const StoreLimits& limits, StoreOrder order,
-                     std::function<void()> ended)
+StoreBody::StoreBody(ArrivalService& arrivals, const StudySight& sight, const StoreLimits& limits,
+                     StoreOrder order, std::function<void()> ended)
     : mArrivals(arrivals)
+    , mSight(sight)
     , mLimits(limits)
     , mOrder(std::move(order))
     , mEnded(std::move(ended))
@@ -107,7 +108,9 @@ void StoreBody::commit()
 {
     std::vector<ArrivedObject> objects;
     const Result connected = mArrivals.database().ask([&](Kxg::Catalogue& catalogue) {
-        objects = mArrivals.store().commit(mWhole, catalogue, mOrder.studyUID);
+        objects = mArrivals.store().commit(mWhole, catalogue, mOrder.studyUID, [this](const TagMap& image) {
+            return mSight.admits(mOrder.limits, image);
+        });
         return Result();
     });
     if (connected.bad())
@@ -124,7 +127,21 @@ void StoreBody::add(const ArrivedObject& object)
         LogFile::warnf("Request %s: object %s is not stored: %s", mOrder.id.constData(),
                        object.sopInstanceUID.isEmpty() ? "without name" : object.sopInstanceUID.constData(),
                        qUtf8Printable(object.reason));
+    else if (!object.isKnown)
+        note(object);
     mReport.add(object);
+}
+
+void StoreBody::note(const ArrivedObject& object)
+{
+    ++mEffect.images;
+    if (!mEffect.studies.contains(object.studyUID))
+        mEffect.studies.append(object.studyUID);
+}
+
+std::optional<Http::Effect> StoreBody::effect() const
+{
+    return mEffect.images > 0 ? std::make_optional(mEffect) : std::nullopt;
 }
 
 Http::Response StoreBody::answer()

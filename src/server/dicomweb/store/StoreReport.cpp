@@ -94,6 +94,8 @@ int failureReason(ArrivalFault fault)
         return 0xC001;
     case ArrivalFault::OtherContent:
         return 0x0111;
+    case ArrivalFault::NotAllowed:
+        return 0x0124;
     case ArrivalFault::Failed:
         break;
     }

@@ -79,9 +79,11 @@ Http::Response StoreResource::receive(const Http::Request& request, const Resour
     order.id = request.id;
     order.root = request.base;
     order.studyUID = path.study;
+    order.limits = request.studies;
     order.form = offer == 2 ? StoreReport::Form::Xml : StoreReport::Form::Json;
     Http::Response response;
-    response.sink = std::make_unique<StoreBody>(mArrivals, mLimits, std::move(order), [this] { --mCount; });
+    response.sink =
+        std::make_unique<StoreBody>(mArrivals, mSight, mLimits, std::move(order), [this] { --mCount; });
     return response;
 }
 

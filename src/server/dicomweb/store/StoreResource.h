@@ -12,9 +12,10 @@ namespace Kdd::DicomWeb
 class StoreResource : public Resource
 {
 public:
-    /// `arrivals` outlives the object.
-    StoreResource(ArrivalService& arrivals, const StoreLimits& limits)
+    /// `arrivals` and `sight` outlive the object.
+    StoreResource(ArrivalService& arrivals, const StudySight& sight, const StoreLimits& limits)
         : mArrivals(arrivals)
+        , mSight(sight)
         , mLimits(limits)
     {
     }
@@ -26,6 +27,7 @@ public:
 
 private:
     ArrivalService& mArrivals;
+    const StudySight& mSight;
     const StoreLimits mLimits;
     std::atomic<int> mCount{0};  // of requests that are being received
 };

@@ -1,0 +1,251 @@
+#include "server/Server.h"
+#include "server/access/RightsTable.h"
+#include "server/access/TokenIssuer.h"
+#include "server/http/Client.h"
+#include "support/DatasetBuilder.h"
+#include "support/TemporaryStore.h"
+
+#include <QDir>
+
+#include <gtest/gtest.h>
+#include <kddlib/Kxg.h>
+
+using namespace Kdd;
+using namespace Kdd::Access;
+
+namespace
+{
+
+constexpr qint64 kFarAway = 4'000'000'000;  // [s since 1970]
+
+/// An archive of a study "1.2" of North and one "1.9" of South, and those who may see what is North's only.
+class StudyLimits : public testing::Test
+{
+protected:
+    StudyLimits()
+    {
+        QDir().mkpath(mStore.filePath("images"));
+        save("north", anImage("1.2.3.1").with(DCM_InstitutionName, "North").with(DCM_PatientName, "A"));
+        save("south", southern("1.9.3.1"));
+        kdd({QStringLiteral("add"), mStore.filePath("images")});
+        Kxg::SetDatabaseServer("sqlite:" + mStore.filePath("kdd.sqlite").toUtf8());
+        mSettings.http.address = {"127.0.0.1", 0};
+        mSettings.objects.emplace();
+        mSettings.objects->folder = mStore.filePath("objects").toUtf8();
+        mSettings.objects->freeBytes = 0;
+        putFile(mStore.filePath("keys.json"), mIssuer.keySet());
+        const QByteArray file =
+            R"({"tokens":{"issuer":"https://login.example","audience":"archive","keys":")" +
+            mStore.filePath("keys.json").toUtf8() +
+            R"(","rights":[{"gives":["read","store","correct","delete"]}],)" +
+            R"("studies":[{"claim":"sites","attribute":"InstitutionName"}]}})";
+        EXPECT_EQ(AccessRules::parse(file, mSettings.access.emplace()).text(), QString());
+        Result result;
+        mServer = Server::make(mSettings, result);
+        EXPECT_EQ((mServer != nullptr ? mServer->start() : result).text(), QString());
+    }
+
+    static DatasetBuilder southern(const char* uid)
+    {
+        return anImage(uid)
+            .inStudy("1.9")
+            .inSeries("1.9.3")
+            .with(DCM_PatientID, "7")
+            .with(DCM_InstitutionName, "South");
+    }
+    void save(const char* name, const DatasetBuilder& image) const
+    {
+        DcmDataset copy(image.build());
+        DcmFileFormat file(&copy);
+        const QByteArray target = mStore.filePath("images").toUtf8() + '/' + name;
+        EXPECT_TRUE(file.saveFile(target.constData(), EXS_LittleEndianExplicit).good());
+    }
+    void kdd(const QStringList& arguments) const
+    {
+        QProcess process;
+        process.start(QStringLiteral(KDD_BINARY),
+                      QStringList{QStringLiteral("--store"), mStore.folder(), QStringLiteral("--quiet")} +
+                          arguments);
+        ASSERT_TRUE(process.waitForFinished(120000));
+        ASSERT_EQ(process.exitCode(), 0) << process.readAllStandardError().toStdString();
+    }
+
+    /// A header with a token of the sites; without sites it has no such claim.
+    QByteArray token(const QJsonValue& sites) const
+    {
+        QJsonObject claims = TokenIssuer::claimsWith("exp", kFarAway);
+        if (!sites.isUndefined())
+            claims.insert(QStringLiteral("sites"), sites);
+        return "Authorization: Bearer " + mIssuer.token(claims) + "\r\n";
+    }
+    Reply ask(const QByteArray& method, const QByteArray& path, const QByteArray& headers,
+              const QByteArray& body = {}) const
+    {
+        Client client(mServer->address());
+        client.send(method + ' ' + path +
+                    " HTTP/1.1\r\nHost: localhost\r\nContent-Type: application/dicom\r\n" + headers +
+                    "Content-Length: " + QByteArray::number(body.size()) + "\r\n\r\n" + body);
+        return client.reply(method == "HEAD" ? Client::Body::StaysBehind : Client::Body::Follows);
+    }
+    QByteArray get(const QByteArray& path, const QByteArray& headers) const
+    {
+        return ask("GET", path, headers).body;
+    }
+
+    /// Status, header and body without what differs from answer to answer.
+    std::string sameOf(const QByteArray& method, QByteArray path, const QByteArray& study,
+                       const QByteArray& headers) const
+    {
+        path.replace("{s}", study);
+        const Reply reply = ask(method, path, headers);
+        QByteArray text = QByteArray::number(reply.status) + '\n';
+        for (const QByteArray& line : reply.head.split('\n'))
+            if (!line.startsWith("X-Request-Id") && !line.startsWith("Date"))
+                text += line + '\n';
+        return (text + reply.body).toStdString();
+    }
+
+    /// Where an answer about a study may come from: each resource on each level, with each kind of address.
+    static QVector<QByteArray> paths()
+    {
+        QVector<QByteArray> all = {"/wado?requestType=WADO&studyUID={s}&seriesUID=1.9.3&objectUID=1.9.3.1",
+                                   "/browser/config"};
+        for (const char* rest : {"", "/sizes", "/corrections", "/preview", "/difference?a=1.9.3.1&b=1.9.3.1",
+                                 "/series/1.9.3/preview", "/series/1.9.3/images", "/images/1.9.3.1/preview",
+                                 "/images/1.9.3.1/attributes"})
+            all << QByteArray("/browser/studies/{s}") + rest;
+        for (const QByteArray& resource : RightsTable::resources())
+            for (const char* level : {"", "/studies/{s}", "/studies/{s}/series/1.9.3",
+                                      "/studies/{s}/series/1.9.3/instances/1.9.3.1"})
+                for (const char* rest : {"", "/1", "/1/rendered", "?StudyInstanceUID={s}",
+                                         "?studyUID={s}&seriesUID=1.9.3&objectUID=1.9.3.1&requestType=WADO"})
+                    all << QByteArray("/dicom-web") + level + (resource.isEmpty() ? "" : "/" + resource) +
+                               rest;
+        return all;
+    }
+
+    TemporaryStore mStore;
+    const TokenIssuer mIssuer;
+    ServerSettings mSettings;
+    std::unique_ptr<Server> mServer;
+};
+
+TEST_F(StudyLimits, AnswerOfEveryResourceAsIfOthersDidNotExist)
+{
+    const QByteArray limited = token(QStringLiteral("North"));
+    const QByteArray whole = token(QJsonArray{QStringLiteral("*")});
+    // What changes something comes last.
+    for (const char* method : {"GET", "HEAD", "OPTIONS", "POST", "DELETE", "PUT"}) {
+        int seen = 0;
+        for (const QByteArray& path : paths()) {
+            const std::string hidden = sameOf(method, path, "1.9", limited);
+            EXPECT_EQ(hidden, sameOf(method, path, "1.8", limited)) << method << ' ' << path.constData();
+            EXPECT_EQ(hidden.find("1.9.3"), std::string::npos) << hidden;
+            if (*method == 'G')
+                seen += hidden != sameOf(method, path, "1.9", whole) ? 1 : 0;
+        }
+        if (*method == 'G') {
+            EXPECT_GE(seen, 20) << "there is something to hide";
+        }
+    }
+    EXPECT_EQ(ask("GET", "/dicom-web/studies/1.9/metadata", whole).status, 200);
+}
+
+TEST_F(StudyLimits, FollowTheClaim)
+{
+    const struct
+    {
+        QJsonValue sites;
+        const char* studies;
+    } kClaims[] = {
+        {QStringLiteral("North"), "1.2"},
+        {QJsonArray{QStringLiteral("South"), QStringLiteral("Nowhere")}, "1.9"},
+        {QJsonArray{QStringLiteral("South"), QStringLiteral("North")}, "1.2 1.9"},
+        {QStringLiteral("*"), "1.2 1.9"},
+        {QJsonArray{QStringLiteral("x"), QStringLiteral("*")}, "1.2 1.9"},
+        {QStringLiteral("N*"), ""},
+        {QStringLiteral("North South"), ""},
+        {QStringLiteral("north"), ""},
+        {QStringLiteral(""), ""},
+        {QJsonValue(), ""},
+        {7, ""},
+        {QJsonValue(QJsonValue::Undefined), ""},
+    };
+    for (const auto& each : kClaims) {
+        const QByteArray headers = token(each.sites);
+        QByteArrayList found;
+        for (const QByteArray study : {"1.2", "1.9"}) {
+            const int status = ask("GET", "/dicom-web/studies/" + study + "/metadata", headers).status;
+            const bool isListed = get("/dicom-web/studies", headers).contains("\"" + study + "\"");
+            EXPECT_EQ(status, isListed ? 200 : 404) << study.constData();
+            EXPECT_EQ(get("/dicom-web/changefeed", headers).contains("\"" + study + "\""), isListed);
+            if (isListed)
+                found << study;
+        }
+        EXPECT_EQ(found.join(' ').toStdString(), each.studies);
+    }
+    const Reply page = ask("GET", "/dicom-web/studies?limit=1", token(QStringLiteral("North")));
+    EXPECT_EQ(page.header("Warning"), "") << "others are not counted";
+    EXPECT_EQ(get("/dicom-web/patients", token(QStringLiteral("North"))).count("00201200"), 1);
+}
+
+TEST_F(StudyLimits, FollowCorrectionsAndArrivals)
+{
+    const QByteArray north = token(QStringLiteral("North"));
+    const auto fileOf = [&](const DatasetBuilder& image) {
+        save("sent", image);
+        return fileContent(mStore.filePath("images/sent"));
+    };
+    const auto store = [&](const DatasetBuilder& image, const QByteArray& path = "/dicom-web/studies") {
+        const Reply reply = ask("POST", path, north, fileOf(image));
+        return reply.status * 1000 + reply.body.contains("292");  // 0124, not allowed
+    };
+    EXPECT_EQ(store(anImage("1.2.3.2").with(DCM_InstitutionName, "North")), 200000);
+    EXPECT_EQ(store(anImage("1.2.3.3").without(DCM_InstitutionName)), 200000) << "it joins what he may see";
+    EXPECT_EQ(store(anImage("1.2.3.4").with(DCM_InstitutionName, "South")), 409001);
+    EXPECT_EQ(store(anImage("5.1").inStudy("5").inSeries("5.0").with(DCM_InstitutionName, "North")), 200000);
+    EXPECT_EQ(store(anImage("6.1").inStudy("6").inSeries("6.0")), 409001);
+    EXPECT_EQ(store(southern("1.9.3.2").with(DCM_InstitutionName, "North")), 409001);
+    EXPECT_EQ(store(southern("1.9.3.2").with(DCM_InstitutionName, "North"), "/dicom-web/studies/1.9"),
+              409001);
+    EXPECT_TRUE(get("/dicom-web/studies", north).contains("\"5\"")) << "at once";
+    EXPECT_EQ(ask("GET", "/dicom-web/studies/5/metadata", north).status, 200);
+    const QByteArray tag = ask("GET", "/dicom-web/studies/1.2/metadata", north).header("ETag");
+    putFile(mStore.filePath("job.xml"),
+            "<Job><Timestamp>20240601093000</Timestamp><Login>anna</Login><Substitutions><Tag Group=\"0008\" "
+            "Element=\"0080\"><Value>South</Value></Tag></Substitutions></Job>");
+    kdd({QStringLiteral("qa"), mStore.filePath("job.xml"), QStringLiteral("--study"), QStringLiteral("1.2"),
+         QStringLiteral("--image"), QStringLiteral("1.2.3.1")});
+    EXPECT_EQ(ask("GET", "/dicom-web/studies/1.2/metadata", north + "If-None-Match: " + tag + "\r\n").status,
+              404);
+    EXPECT_EQ(get("/dicom-web/studies/1.2/series", north), "[]");
+}
+
+TEST_F(StudyLimits, AreRefusedWhereTheyKeepNothing)
+{
+    const QByteArray begin =
+        R"({"tokens":{"issuer":"i","audience":"a","keys":"k","rights":[{"gives":["read"]}],)";
+    const struct
+    {
+        QByteArray text;
+        const char* fault;
+    } kFiles[] = {
+        {begin + R"("studies":[{"claim":"c","attribute":"ReferringPhysicianName"}]}})", ""},
+        {begin + R"("studies":[{"claim":"c","attribute":"0020000D"}]}})", ""},
+        {begin + R"("studies":[{"claim":"c","attribute":"InstitutionNam"}]}})", "no attribute by which"},
+        {begin + R"("studies":[{"claim":"c","attribute":"PixelData"}]}})", "no attribute by which"},
+        {begin + R"("studies":[{"claim":"c","attribute":"StudyDate"}]}})", "no attribute by which"},
+        {begin + R"("studies":[{"claim":"c","attribute":"OtherPatientNames"}]}})", "no attribute by which"},
+        {begin + R"("studies":[{"attribute":"InstitutionName"}]}})", "tokens.studies.claim is no text"},
+        {begin + R"("studies":[]}})", "tokens.studies is no list"},
+        {begin + R"("studies":[{"claim":"c","attribute":"StudyID"}]},"anyone":["read"]})", "keeps nothing"},
+    };
+    for (const auto& each : kFiles) {
+        AccessRules rules;
+        const std::string fault = AccessRules::parse(each.text, rules).text().toStdString();
+        EXPECT_TRUE(*each.fault == '\0' ? fault.empty() : fault.find(each.fault) != std::string::npos)
+            << fault;
+    }
+}
+
+}  // namespace
