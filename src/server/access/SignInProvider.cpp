@@ -16,7 +16,7 @@ constexpr qint64 kLongestAnswer = 256 * 1024;  // [bytes]; tokens and descriptio
 constexpr int kLongestAddress = 2000;
 
 /// People wait for it, each with a thread of ours.
-constexpr auto kPatience = std::chrono::seconds(5);
+constexpr auto kPatience = std::chrono::seconds(15);
 constexpr auto kPause = std::chrono::seconds(10);
 
 /// Browsers are sent there, and codes and secrets: never without encryption but to this machine.

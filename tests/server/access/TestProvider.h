@@ -55,7 +55,7 @@ private:
                  {QStringLiteral("token_endpoint"), QString::fromLatin1(url("/token"))},
                  {QStringLiteral("end_session_endpoint"), QString::fromLatin1(url("/end"))}}))};
         if (request.startsWith("GET /keys "))
-            return {httpResponse(issuer.keySet())};
+            return {httpResponse(mKeys)};
         const QUrlQuery form(QString::fromLatin1(request.mid(request.indexOf("\r\n\r\n") + 4)));
         const auto field = [&](const char* name) {
             return form.queryItemValue(QLatin1String(name), QUrl::FullyDecoded);
@@ -80,6 +80,7 @@ private:
                                                 {QStringLiteral("token_type"), QStringLiteral("Bearer")}}))};
     }
 
+    const QByteArray mKeys = issuer.keySet();  // made once: a server does not wait long for them
     std::mutex mMutex;
     QMap<QByteArray, QMap<QString, QString>> mChallenges;
     int mCodes = 0;
