@@ -164,7 +164,7 @@ Dimse::TlsRules readTls(Section section)
 Result PeersFile::parse(const QByteArray& text, PeersFile& file)
 {
     QJsonObject object;
-    if (!Access::parseObject(text, object))
+    if (!Http::parseObject(text, object))
         return Result::failure(QStringLiteral("it is no JSON object, or says something twice"));
     Result result;
     PeersFile made;
