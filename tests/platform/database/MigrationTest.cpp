@@ -116,4 +116,36 @@ TEST_P(MigrationTest, ADatabaseOfTheThirdSchemaIsFoundBySearchesOnceItIsPrepared
     EXPECT_TRUE(found[0].attributes.contains("Müller^Eva")) << found[0].attributes.toStdString();
 }
 
+/// With a name that no index of a server would take.
+TEST_P(MigrationTest, ADatabaseOfTheFourthSchemaGetsTheIndexOfNames)
+{
+    DicomFileRecord file = dicom("/d/a", "1.2", "1.2.1", "x");
+    file.patientName = "Doe^John";
+    add({file});
+    QByteArray name;
+    for (quint32 i = 1; name.size() < 8000; i = i * 1664525 + 1013904223)
+        name += QByteArray::number(i, 36);
+    for (const QByteArray& backwards :
+         {QByteArray("DROP INDEX study_search_by_date"),
+          QByteArray(
+              "CREATE INDEX study_search_by_date ON study_search (study_date DESC, study_time DESC, uid)"),
+          "UPDATE study_search SET name_words = '" + name + "'"})
+        execute(backwards.constData());
+    if (GetParam() == Engine::Postgres)
+        execute("ALTER TABLE study_search ALTER COLUMN name_words SET STATISTICS -1");
+    execute("UPDATE schema_version SET version = 4");
+    open();
+    DatabaseAddress parsed;
+    ASSERT_TRUE(DatabaseAddress::parse(address(), parsed).good());
+    SqlConnection connection(parsed, SqlConnection::IfAbsent::Fail);
+    SqlRows rows = connection.askOnce(
+        GetParam() == Engine::Postgres ? "SELECT attstattarget FROM pg_attribute WHERE attname = 'name_words'"
+                                         " AND attrelid = 'study_search'::regclass"
+                                       : "SELECT 1000 FROM pragma_index_info('study_search_by_date')"
+                                         " WHERE name = 'name_words'",
+        {});
+    ASSERT_TRUE(rows.next());
+    EXPECT_EQ(rows.number(0), 1000);
+}
+
 }  // namespace
