@@ -1,5 +1,7 @@
 #include "support/PostgresServer.h"
 
+#include "support/FileContent.h"
+
 #include <QDir>
 #include <QProcess>
 #include <QTemporaryDir>
@@ -52,6 +54,18 @@ struct Server
         program.waitForFinished(kPatience);
     }
 
+    /// To the one that others are made by first, so that none is missed.
+    void signal(int number) const
+    {
+        const QByteArray parent = QByteArray::number(program.processId());
+        ::kill(static_cast<pid_t>(program.processId()), number);
+        for (const QString& process : QDir(QStringLiteral("/proc")).entryList(QDir::Dirs)) {
+            const QByteArray status = fileContent(QStringLiteral("/proc/%1/status").arg(process));
+            if (status.contains("\nPPid:\t" + parent + '\n'))
+                ::kill(process.toInt(), number);
+        }
+    }
+
     QTemporaryDir folder{QDir::tempPath() + QStringLiteral("/kddpg")};
     QProcess program;
     int databases = 0;
@@ -96,6 +110,16 @@ void stopPostgres()
 void startPostgres()
 {
     server().start();
+}
+
+FrozenPostgres::FrozenPostgres()
+{
+    server().signal(SIGSTOP);
+}
+
+FrozenPostgres::~FrozenPostgres()
+{
+    server().signal(SIGCONT);
 }
 
 void runOnPostgres(const QByteArray& sql)

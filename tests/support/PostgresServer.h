@@ -19,6 +19,16 @@ QByteArray postgresAddress(const QByteArray& database);
 void stopPostgres();
 void startPostgres();
 
+/// While it lives no process of the server does anything, and its machine takes what is sent to it all the same.
+class FrozenPostgres
+{
+public:
+    FrozenPostgres();
+    ~FrozenPostgres();
+    FrozenPostgres(const FrozenPostgres&) = delete;
+    FrozenPostgres& operator=(const FrozenPostgres&) = delete;
+};
+
 /// Runs a statement over a connection of its own.
 void runOnPostgres(const QByteArray& sql);
 

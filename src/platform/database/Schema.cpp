@@ -158,6 +158,18 @@ const QStringList kSteps[] = {
         // know must not bring these back.
         QStringLiteral("CREATE TABLE forgotten_file (path {bytes} NOT NULL PRIMARY KEY)"),
     },
+    {
+        // Names too, so that whoever walks the list for a part of one reads nothing but the index; a server also wants
+        // there what is asked for.
+        QStringLiteral("DROP INDEX study_search_by_date"),
+        QStringLiteral("{bounded names}"),
+        QStringLiteral("CREATE INDEX study_search_by_date ON study_search"
+                       " (study_date DESC, study_time DESC, uid{also}study_id, name_words)"),
+        QStringLiteral("DROP INDEX study_search_by_name"),
+        QStringLiteral("CREATE INDEX study_search_by_name ON study_search"
+                       " (sort_name, patient_id, study_date DESC, study_time DESC, uid{also}study_id)"),
+        QStringLiteral("{finer statistics}"),
+    },
 };
 
 QString firstRow(SqlConnection& connection, const QString& question)
@@ -206,8 +218,17 @@ void takeStep(SqlConnection& connection, int version)
         statement.replace(QLatin1String("{text}"), dialect.text);
         statement.replace(QLatin1String("{bytes}"), dialect.bytes);
         statement.replace(QLatin1String("{key}"), dialect.key);
+        statement.replace(QLatin1String("{also}"), dialect.alsoInIndex);
         if (statement == QLatin1String("{words table}")) {
             makeWordsTable(connection);
+            continue;
+        }
+        if (statement == QLatin1String("{bounded names}")) {
+            boundNames(connection);
+            continue;
+        }
+        if (statement == QLatin1String("{finer statistics}")) {
+            refineStatistics(connection);
             continue;
         }
         statement.replace(QLatin1String("{bytes of file.sop_uid}"),
@@ -244,6 +265,8 @@ void bringSchemaUpToDate(SqlConnection& connection)
     if (version == 0)
         for (const QString& statement : SqlDialect::of(connection.address().engine).beforeSchema)
             executePatiently(connection, statement);
+    // Of a large archive a step may take as long as it does.
+    const SqlConnection::Unhurried unhurried(connection);
     connection.transact(SqlConnection::Access::Write, [&] { migrate(connection); });
     connection.holdToSchema(currentSchemaVersion());
 }

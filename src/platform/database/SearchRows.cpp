@@ -19,6 +19,15 @@ namespace
 /// A series without number comes last.
 constexpr qint64 kNoNumber = std::numeric_limits<qint32>::max();
 
+// A server takes no more than 2,700 bytes into an index, all columns together. What is longer than DICOM allows by far is
+// found by its beginning, instead of keeping its study out of the archive.
+constexpr int kMostIndexed = 1000;  // [bytes]
+
+QVariant indexedValue(const QByteArray& text)
+{
+    return textValue(text.left(kMostIndexed));
+}
+
 QByteArray words(const QByteArray& text)
 {
     return searchText(QString::fromUtf8(text));
@@ -48,7 +57,7 @@ QList<QByteArray> modalitiesOf(const StudySearchRecord& study)
     QSet<QByteArray> found;
     for (const SeriesSearchRecord& series : study.series) {
         if (!series.modality.isEmpty())
-            found.insert(series.modality);
+            found.insert(series.modality.left(kMostIndexed));
     }
     QList<QByteArray> sorted = found.values();
     std::sort(sorted.begin(), sorted.end());
@@ -68,7 +77,7 @@ void putSeries(SqlConnection& connection, qint64 studyId, const SeriesSearchReco
         connection.change(
             "INSERT INTO series_request (study_id, uid, scheduled_step, requested_procedure)"
             " VALUES (?, ?, ?, ?)",
-            {studyId, textValue(series.uid), textValue(request.first), textValue(request.second)});
+            {studyId, textValue(series.uid), indexedValue(request.first), indexedValue(request.second)});
 }
 
 void put(SqlConnection& connection, qint64 studyId, const StudySearchRecord& study,
@@ -86,10 +95,10 @@ void put(SqlConnection& connection, qint64 studyId, const StudySearchRecord& stu
             " SELECT id, uid, CAST(? AS SMALLINT), CAST(? AS BIGINT), CAST(? AS BIGINT), ?, ?, ?,"
             " ?, ?, ?, ?, ?, ?, ?, ?, CAST(? AS BIGINT), CAST(? AS BIGINT) FROM study WHERE id = ?",
             {isBuilt ? 1 : 0, tagFile.fileSize, tagFile.modified, bytesValue(tagFile.digest),
-             textValue(study.date), textValue(study.time), textValue(study.accessionNumber),
-             textValue(study.patientID), textValue(study.patientBirthDate), textValue(study.patientSex),
-             textValue(study.studyID), textValue(sortName(QString::fromUtf8(study.patientName))),
-             textValue(names(study.patientName)), textValue(modalities.join('\\')),
+             textValue(study.date), textValue(study.time), indexedValue(study.accessionNumber),
+             indexedValue(study.patientID), textValue(study.patientBirthDate), textValue(study.patientSex),
+             indexedValue(study.studyID), indexedValue(sortName(QString::fromUtf8(study.patientName))),
+             indexedValue(names(study.patientName)), textValue(modalities.join('\\')),
              static_cast<qint64>(study.series.size()), instances, studyId}) == 0)
         return;
     connection.change("INSERT INTO study_answer (study_id, attributes) VALUES (?, ?)",

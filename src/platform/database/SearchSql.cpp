@@ -18,10 +18,6 @@ constexpr int kIndexedPart = 3;
 /// part of a text.
 constexpr int kFrequent = 2000;
 
-// Of so many studies that is the part which the newest ones are held against.
-constexpr int kArchive = 100000;
-constexpr int kSample = 4000;
-
 /// The longest piece between two stars.
 QByteArray longestPart(const QByteArray& pattern)
 {
@@ -126,16 +122,17 @@ private:
     void addWords(SearchSql& sql, const QByteArray& column, const QByteArray& pattern)
     {
         const QVariant whole = textValue(mDialect.pattern(pattern));
-        // Names stand in the rows of the list as well.
+        const QByteArray part = longestPart(pattern);
+        // Names stand in the list's index, so that to walk the whole list takes no longer than to look through all texts.
         const bool isName = column == "patient_name";
         const QByteArray ofRow =
             isName ? QByteArray("s.name_words")
                    : "(SELECT w." + column + " FROM study_words w WHERE w.study_id = s.study_id)";
-        if (mFrequent.contains(pattern) || (isName && !mDialect.hasMatchIndex)) {
+        if (mFrequent.contains(pattern) ||
+            (isName && (!mDialect.hasMatchIndex || part.size() < kIndexedPart))) {
             append(sql, matches(ofRow), {whole});
             return;
         }
-        const QByteArray part = longestPart(pattern);
         if (mDialect.hasMatchIndex && part.size() >= kIndexedPart)
             append(sql, "s.study_id IN (SELECT rowid FROM study_parts WHERE study_parts MATCH ?)",
                    {textValue(phrase(column, part))});
@@ -226,26 +223,33 @@ QByteArray order(const SearchQuery& query, const QByteArray& table)
     return text + table + ".uid";
 }
 
-/// Whether the list is walked for the term anyway.
-bool isWalked(const SearchTerm& term, const QSet<QByteArray>& frequent)
+/// Whether the list is walked for the term anyway, or may be.
+bool isWalked(const SqlDialect& dialect, const SearchTerm& term, const QSet<QByteArray>& frequent)
 {
     if (!term.values.isEmpty())
         return false;
-    return term.column == SearchColumn::StudyDate ||
-           (!term.patterns.isEmpty() &&
-            std::all_of(term.patterns.begin(), term.patterns.end(),
-                        [&](const QByteArray& each) { return frequent.contains(each); }));
+    if (term.column == SearchColumn::StudyDate)
+        return true;
+    // A server weighs that against its index itself.
+    if (!dialect.hasMatchIndex)
+        return columnOf(term.column).words != nullptr;
+    return !term.patterns.isEmpty() &&
+           std::all_of(term.patterns.begin(), term.patterns.end(), [&](const QByteArray& each) {
+               return frequent.contains(each) ||
+                      (term.column == SearchColumn::PatientName && longestPart(each).size() < kIndexedPart);
+           });
 }
 
 /// The one modality that is asked for and nothing that narrows the search more.
-const SearchTerm* leadingModality(const SearchQuery& query, const QSet<QByteArray>& frequent)
+const SearchTerm* leadingModality(const SqlDialect& dialect, const SearchQuery& query,
+                                  const QSet<QByteArray>& frequent)
 {
     const SearchTerm* modality = nullptr;
     for (const SearchTerm& term : query.terms) {
         if (term.column == SearchColumn::ModalitiesInStudy && term.values.size() == 1 &&
             term.patterns.isEmpty())
             modality = &term;
-        else if (!isWalked(term, frequent))
+        else if (!isWalked(dialect, term, frequent))
             return nullptr;
     }
     return isNewestFirst(query) ? modality : nullptr;
@@ -257,19 +261,20 @@ SearchSql studiesFrom(const SqlDialect& dialect, const SearchQuery& query, const
 {
     Conditions conditions(dialect, limits, frequent);
     // The list of a modality is kept in its order. Walking it looks at nothing that is not wanted.
-    const SearchTerm* leading = isListed ? leadingModality(query, frequent) : nullptr;
+    const SearchTerm* leading = isListed ? leadingModality(dialect, query, frequent) : nullptr;
     for (const SearchTerm& term : query.terms) {
         if (&term != leading)
             conditions.add(term);
     }
     SearchSql sql;
     if (leading != nullptr) {
-        // Both tables have the columns that are asked of and sorted by.
+        // Both tables have the columns that are asked of and sorted by; what else is asked of is in the other one.
         SearchSql dates = conditions.study();
         dates.text.replace("s.study_", "m.study_");
-        sql.text =
-            " FROM study_modality m JOIN study_search s ON s.study_id = m.study_id WHERE m.modality = ?" +
-            dates.text;
+        sql.text = " FROM study_modality m";
+        if (dates.text.contains("s.name_words"))
+            sql.text += " JOIN study_search s ON s.study_id = m.study_id";
+        sql.text += " WHERE m.modality = ?" + dates.text;
         sql.values << textValue(leading->values.front());
         sql.values += dates.values;
         return sql;
@@ -317,36 +322,32 @@ SearchSql isFrequentSql(const SqlDialect& dialect, const SearchTerm& term, const
 {
     const char* const column = columnOf(term.column).words;
     const QByteArray part = longestPart(pattern);
-    if (!dialect.hasMatchIndex || column == nullptr)
+    if (!dialect.hasMatchIndex || column == nullptr || part.size() < kIndexedPart)
         return {};
-    if (part.size() >= kIndexedPart)
-        return {
-            "SELECT COUNT(*) >= ? FROM (SELECT 1 FROM study_parts WHERE study_parts MATCH ? LIMIT ?) counted",
+    return {"SELECT COUNT(*) >= ? FROM (SELECT 1 FROM study_parts WHERE study_parts MATCH ? LIMIT ?) counted",
             {kFrequent, textValue(phrase(column, part)), kFrequent}};
-    // The index does not know it, and all texts would be looked through: the newest tell how frequent it is.
-    if (term.column != SearchColumn::PatientName)
-        return {};
-    return {"SELECT COUNT(*) >= ? FROM (SELECT name_words FROM study_search"
-            " ORDER BY study_date DESC, study_time DESC, uid LIMIT ?) newest WHERE " +
-                dialect.wordsOf.arg(QLatin1String("name_words")).toLatin1(),
-            {kFrequent * kSample / kArchive, kSample, textValue(dialect.pattern(pattern))}};
 }
 
-SearchSql studiesSql(const SqlDialect& dialect, const SearchQuery& query, const StudyLimits* limits,
-                     const QSet<QByteArray>& frequent)
+SearchSql studyIdsSql(const SqlDialect& dialect, const SearchQuery& query, const StudyLimits* limits,
+                      const QSet<QByteArray>& frequent)
 {
-    // The page first, then what it shows: what answers show is large, and would be carried through the sorting.
-    const SearchSql from = studiesFrom(dialect, query, limits, true, frequent);
-    const bool isByModality = from.text.startsWith(" FROM study_modality");
-    SearchSql sql;
-    sql.text = QByteArray("SELECT page.*, a.attributes FROM (SELECT ") + kStudyColumns +
-               ", s.study_date, s.study_time, s.sort_name, s.patient_id, s.accession_number,"
-               " s.patient_birth_date, s.patient_sex, s.study_code" +
-               from.text + order(query, isByModality ? "m" : "s");
-    sql.values = from.values;
+    SearchSql sql = studiesFrom(dialect, query, limits, true, frequent);
+    const QByteArray table = sql.text.startsWith(" FROM study_modality") ? "m" : "s";
+    sql.text = "SELECT " + table + ".study_id" + sql.text + order(query, table);
     addPage(sql, query);
-    sql.text += ") page JOIN study_answer a ON a.study_id = page.study_id" + order(query, "page");
     return sql;
+}
+
+SearchSql shownStudiesSql(const SqlDialect& dialect, const QVector<int>& ids)
+{
+    QByteArrayList numbers;
+    for (const int id : ids)
+        numbers << QByteArray::number(id);
+    return {QByteArray("SELECT ") + kStudyColumns +
+                ", a.attributes FROM study_search s JOIN study_answer a ON a.study_id = s.study_id"
+                " WHERE s.study_id " +
+                dialect.isOneOf.toLatin1(),
+            {dialect.list.arg(QLatin1String(numbers.join(',')))}};
 }
 
 SearchSql seriesSql(const SqlDialect& dialect, const SearchQuery& query, const StudyLimits* limits)

@@ -20,13 +20,17 @@ struct SearchSql
 /// an empty text when the engine decides by itself.
 SearchSql isFrequentSql(const SqlDialect& dialect, const SearchTerm& term, const QByteArray& pattern);
 
-// Each leaves out the studies that are not within `limits`, where that is not null.
+// Each but what is shown leaves out the studies that are not within `limits`, where that is not null.
 //
-// Studies: id, uid, is_built, file_size, file_modified, digest, modalities, series, instances, attributes.
+// Studies: the ids of the page, in order. What it shows is large, and would be carried through the sorting.
 //
 // `frequent` are the patterns that so many studies have that walking the list finds a page sooner than the index.
-SearchSql studiesSql(const SqlDialect& dialect, const SearchQuery& query, const StudyLimits* limits,
-                     const QSet<QByteArray>& frequent);
+SearchSql studyIdsSql(const SqlDialect& dialect, const SearchQuery& query, const StudyLimits* limits,
+                      const QSet<QByteArray>& frequent = {});
+
+// What is shown of the studies of these ids, in any order: id, uid, is_built, file_size, file_modified, digest, modalities,
+// series, instances, attributes. The text is always the same.
+SearchSql shownStudiesSql(const SqlDialect& dialect, const QVector<int>& ids);
 
 // Series: the same of the study, then uid, instances, attributes.
 SearchSql seriesSql(const SqlDialect& dialect, const SearchQuery& query, const StudyLimits* limits);

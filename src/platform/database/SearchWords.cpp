@@ -26,10 +26,6 @@ bool makePostgresIndex(SqlConnection& connection)
                                .arg(columns.join(QStringLiteral(", "))));
         connection.execute(QStringLiteral(
             "CREATE INDEX study_search_parts ON study_search USING gin (name_words gin_trgm_ops)"));
-        // The server guesses from a sample of names how many have a part. From the usual one it takes a part that one in
-        // a hundred has for three times as frequent, and walks the list where the index finds them in a third of the time.
-        connection.execute(
-            QStringLiteral("ALTER TABLE study_search ALTER COLUMN name_words SET STATISTICS 1000"));
         connection.execute(QStringLiteral("RELEASE SAVEPOINT words_index"));
         return true;
     } catch (const DatabaseError& error) {
@@ -77,6 +73,34 @@ void makeWordsTable(SqlConnection& connection)
                                       " INSERT INTO study_parts (study_parts, rowid, %1)"
                                       " VALUES ('delete', old.study_id, %2); END")
                            .arg(QLatin1String(kColumns), columnsOf("old.")));
+}
+
+void boundNames(SqlConnection& connection)
+{
+    {
+        SqlRows rows = connection.ask("SELECT 1 FROM study_search WHERE LENGTH(name_words) > 1000 LIMIT 1");
+        if (!rows.next())
+            return;
+    }
+    // A server would still put the former rows into an index that the same transaction makes, unless it writes the whole
+    // table anew.
+    connection.execute(connection.address().engine == DatabaseAddress::Engine::Sqlite
+                           ? QStringLiteral("UPDATE study_search SET name_words = SUBSTR(name_words, 1, 1000)"
+                                            " WHERE LENGTH(name_words) > 1000")
+                           : QStringLiteral("ALTER TABLE study_search ALTER COLUMN name_words TYPE TEXT"
+                                            " COLLATE \"C\" USING SUBSTR(name_words, 1, 1000)"));
+}
+
+void refineStatistics(SqlConnection& connection)
+{
+    if (connection.address().engine == DatabaseAddress::Engine::Sqlite)
+        return;
+    // The server guesses from a sample of names how many have a part. From the usual one it takes a part that one in a
+    // hundred has for three times as frequent, and walks the list where the index finds them in a third of the time.
+    connection.execute(
+        QStringLiteral("ALTER TABLE study_search ALTER COLUMN name_words SET STATISTICS 1000"));
+    // It would look at them of itself only after many changes.
+    connection.execute(QStringLiteral("ANALYZE study_search"));
 }
 
 bool obtainWordsIndex(SqlConnection& connection)

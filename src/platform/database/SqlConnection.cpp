@@ -2,9 +2,12 @@
 
 #include "platform/database/SqlDialect.h"
 #include "platform/database/SqliteFile.h"
+#include "platform/resources/ExResource.h"
 
 #include <QSqlDatabase>
+#include <QSqlDriver>
 #include <QSqlError>
+#include <QSqlField>
 
 #include <atomic>
 #include <utility>
@@ -14,6 +17,9 @@ namespace Kxg
 namespace
 {
 
+/// How long a writer waits for his turn; the server's lock_timeout.
+constexpr std::chrono::seconds kTurn(30);
+
 DatabaseError errorOf(const QSqlError& error)
 {
     const QString said = error.databaseText().simplified();
@@ -22,11 +28,22 @@ DatabaseError errorOf(const QSqlError& error)
     return DatabaseError(said.isEmpty() ? error.driverText().simplified() : said, isBusy);
 }
 
+std::chrono::seconds patience()
+{
+    return std::chrono::seconds(Kdd::ExResource::databasePatience());
+}
+
 /// Connections are known by name among all threads.
 QString uniqueName()
 {
     static std::atomic<int> sCount{0};
     return QStringLiteral("kdd-%1").arg(++sCount);
+}
+
+void refuseSilent(const DatabaseAddress& address)
+{
+    if (!SilentServers::mayAsk(address.shown.toUtf8()))
+        throw DatabaseError(QStringLiteral("its server did not answer a moment ago"));
 }
 
 }  // namespace
@@ -56,12 +73,20 @@ QVariant bytesValue(const QByteArray& bytes)
     return bytes.isNull() ? QByteArray("") : bytes;
 }
 
+SqlRows::~SqlRows()
+{
+    // What was not read comes nevertheless.
+    const AnswerWatch::Wait wait = mConnection.waiting();
+    mQuery.finish();
+}
+
 bool SqlRows::next()
 {
+    const AnswerWatch::Wait wait = mConnection.waiting();
     if (mQuery.next())
         return true;
     if (mQuery.lastError().isValid())
-        throw errorOf(mQuery.lastError());
+        mConnection.fail(mQuery.lastError());
     return false;
 }
 
@@ -80,11 +105,15 @@ struct SqlConnection::Opened
         database.setPort(address.port);
         database.setUserName(address.user);
         database.setPassword(address.password);
+        QString options = dialect.connectOptions;
+        if (dialect.isRemote)
+            options = options.arg(patience().count());
         database.setConnectOptions(file.isFixed() ? QStringLiteral("QSQLITE_OPEN_READONLY;QSQLITE_OPEN_URI")
-                                                  : dialect.connectOptions);
+                                                  : options);
     }
     ~Opened()
     {
+        watch.reset();
         database.close();
         database = QSqlDatabase();
         QSqlDatabase::removeDatabase(name);
@@ -95,11 +124,13 @@ struct SqlConnection::Opened
     SqliteFile file;
     const QString name;
     QSqlDatabase database;
+    std::unique_ptr<AnswerWatch> watch;
 };
 
 SqlConnection::SqlConnection(DatabaseAddress address, IfAbsent ifAbsent)
     : mAddress(std::move(address))
 {
+    refuseSilent(mAddress);
     open(ifAbsent);
 }
 
@@ -107,26 +138,52 @@ SqlConnection::~SqlConnection() = default;
 
 void SqlConnection::open(IfAbsent ifAbsent)
 {
-    mOnce.reset();
-    mStatements.clear();
-    mOpened.reset();
+    giveUp();
     const SqlDialect& dialect = SqlDialect::of(mAddress.engine);
     // Opening would only say that no driver is loaded.
     if (!QSqlDatabase::isDriverAvailable(dialect.driver))
         throw DatabaseError(QStringLiteral("Qt's database driver %1 is not installed").arg(dialect.driver));
     auto opened = std::make_unique<Opened>(mAddress, dialect, ifAbsent);
-    if (!opened->database.open())
+    const auto begin = std::chrono::steady_clock::now();
+    const bool isOpen = opened->database.open();
+    // The driver counts in whole seconds, from the beginning of the one that it starts in.
+    const bool isSilent = !isOpen && std::chrono::steady_clock::now() - begin > patience() / 2;
+    (isSilent ? SilentServers::noteSilence : SilentServers::noteAnswer)(mAddress.shown.toUtf8());
+    if (!isOpen)
         throw errorOf(opened->database.lastError());
     opened->file.note();
+    opened->watch = std::make_unique<AnswerWatch>(opened->database.driver()->handle());
     mOpened = std::move(opened);
     for (const QString& statement : dialect.afterOpening)
         execute(statement);
 }
 
+AnswerWatch::Wait SqlConnection::waiting() const
+{
+    return {*mOpened->watch, mLimit};
+}
+
+void SqlConnection::fail(const QSqlError& error) const
+{
+    if (!mOpened->watch->hasEnded())
+        throw errorOf(error);
+    SilentServers::noteSilence(mAddress.shown.toUtf8());
+    throw DatabaseError(QStringLiteral("its server did not answer within %1 s").arg(mLimit.count()));
+}
+
+void SqlConnection::giveUp()
+{
+    mOnce.reset();
+    mStatements.clear();
+    mOpened.reset();
+}
+
 bool SqlConnection::isAlive()
 {
-    return mOpened && !mOpened->file.isAnother() &&
-           QSqlQuery(mOpened->database).exec(QStringLiteral("SELECT 1"));
+    if (!mOpened)
+        return false;
+    const AnswerWatch::Wait wait = waiting();
+    return !mOpened->file.isAnother() && QSqlQuery(mOpened->database).exec(QStringLiteral("SELECT 1"));
 }
 
 // ---- transactions
@@ -143,26 +200,38 @@ void SqlConnection::beginOnce(Access access)
 
 void SqlConnection::begin(Access access)
 {
+    refuseSilent(mAddress);
+    mLimit = patience() + (access == Access::Write ? kTurn : std::chrono::seconds(0));
     try {
         beginOnce(access);
     } catch (const DatabaseError&) {
+        if (mOpened && mOpened->watch->hasEnded()) {
+            giveUp();
+            throw;
+        }
         // A connection that was lost since its last use shows here, when no work of the transaction is lost
         // with it.
         rollBack();
         // It lives, so the refusal is the engine's own, for example because others write.
-        if (isAlive())
+        if (isAlive()) {
+            SilentServers::noteAnswer(mAddress.shown.toUtf8());
             throw;
+        }
         // A database that was there is not made anew, empty.
         open(IfAbsent::Fail);
         beginOnce(access);
     }
+    SilentServers::noteAnswer(mAddress.shown.toUtf8());
+    mLimit = mWorkLimit;
 }
 
 void SqlConnection::rollBack() noexcept
 {
     // What cannot be rolled back is lost with its connection; the caller reports the first error, not this one.
-    if (mOpened)
-        QSqlQuery(mOpened->database).exec(QStringLiteral("ROLLBACK"));
+    if (!mOpened)
+        return;
+    const AnswerWatch::Wait wait = waiting();
+    QSqlQuery(mOpened->database).exec(QStringLiteral("ROLLBACK"));
 }
 
 void SqlConnection::transact(Access access, const std::function<void()>& work)
@@ -207,8 +276,9 @@ QSqlQuery& SqlConnection::run(const QByteArray& sql, const QVariantList& values)
         QSqlQuery query(mOpened->database);
         // Rows come one by one and are not kept, since lists may be long.
         query.setForwardOnly(true);
+        const AnswerWatch::Wait wait = waiting();
         if (!query.prepare(QString::fromLatin1(sql)))
-            throw errorOf(query.lastError());
+            fail(query.lastError());
         found = mStatements.emplace(sql, query).first;
     }
     return execute(found->second, values);
@@ -218,14 +288,15 @@ QSqlQuery& SqlConnection::execute(QSqlQuery& query, const QVariantList& values)
 {
     for (int i = 0; i < values.size(); ++i)
         query.bindValue(i, values[i]);
+    const AnswerWatch::Wait wait = waiting();
     if (!query.exec())
-        throw errorOf(query.lastError());
+        fail(query.lastError());
     return query;
 }
 
 SqlRows SqlConnection::ask(const QByteArray& sql, const QVariantList& values)
 {
-    return SqlRows(run(sql, values));
+    return {run(sql, values), *this};
 }
 
 SqlRows SqlConnection::askOnce(const QByteArray& sql, const QVariantList& values)
@@ -234,9 +305,28 @@ SqlRows SqlConnection::askOnce(const QByteArray& sql, const QVariantList& values
         throw DatabaseError(QStringLiteral("the connection is lost"));
     mOnce = std::make_unique<QSqlQuery>(mOpened->database);
     mOnce->setForwardOnly(true);
+    if (SqlDialect::of(mAddress.engine).isRemote) {
+        const AnswerWatch::Wait wait = waiting();
+        if (!mOnce->exec(withValues(sql, values)))
+            fail(mOnce->lastError());
+        return {*mOnce, *this};
+    }
     if (!mOnce->prepare(QString::fromLatin1(sql)))
-        throw errorOf(mOnce->lastError());
-    return SqlRows(execute(*mOnce, values));
+        fail(mOnce->lastError());
+    return {execute(*mOnce, values), *this};
+}
+
+/// Written by the driver, which writes the values of prepared statements in the same way.
+QString SqlConnection::withValues(const QByteArray& sql, const QVariantList& values) const
+{
+    const QList<QByteArray> pieces = sql.split('?');
+    QString text = QString::fromLatin1(pieces.front());
+    for (int i = 0; i < values.size(); ++i) {
+        QSqlField field(QString(), values[i].type());
+        field.setValue(values[i]);
+        text += mOpened->database.driver()->formatValue(field) + QString::fromLatin1(pieces.value(i + 1));
+    }
+    return text;
 }
 
 int SqlConnection::change(const QByteArray& sql, const QVariantList& values)
@@ -252,8 +342,9 @@ void SqlConnection::execute(const QString& sql)
     if (!mOpened)
         throw DatabaseError(QStringLiteral("the connection is lost"));
     QSqlQuery query(mOpened->database);
+    const AnswerWatch::Wait wait = waiting();
     if (!query.exec(sql))
-        throw errorOf(query.lastError());
+        fail(query.lastError());
 }
 
 }  // namespace Kxg

@@ -2,12 +2,15 @@
 
 #include "platform/base/IfAbsent.h"
 #include "platform/base/Result.h"
+#include "platform/database/AnswerWatch.h"
 #include "platform/database/DatabaseAddress.h"
 
 #include <QByteArray>
+#include <QSqlError>
 #include <QSqlQuery>
 #include <QVariant>
 
+#include <chrono>
 #include <functional>
 #include <map>
 #include <memory>
@@ -41,16 +44,19 @@ Kdd::Result attempt(const DatabaseAddress& address, const std::function<void()>&
 QVariant textValue(const QByteArray& text);
 QVariant bytesValue(const QByteArray& bytes);
 
+class SqlConnection;
+
 /// The answer to a question, row by row. The connection must outlive it, and no other statement may run over it before
 /// the last row that is wanted is read: rows come from the engine one by one.
 class SqlRows
 {
 public:
-    explicit SqlRows(QSqlQuery& query)
+    SqlRows(QSqlQuery& query, SqlConnection& connection)
         : mQuery(query)
+        , mConnection(connection)
     {
     }
-    ~SqlRows() { mQuery.finish(); }
+    ~SqlRows();
     SqlRows(const SqlRows&) = delete;
     SqlRows& operator=(const SqlRows&) = delete;
 
@@ -64,10 +70,15 @@ public:
 
 private:
     QSqlQuery& mQuery;
+    SqlConnection& mConnection;
 };
 
 /// A connection to an image database. It belongs to the thread that made it. Statements are prepared once and kept, so
 /// their texts must be few: values are bound and never part of a text. What fails throws DatabaseError.
+///
+/// A server that stands still is not waited for without end: to connect and to begin a transaction may take as long as the
+/// site's setting says (ExResource::databasePatience), a statement in it kLongestWork unless the connection is told
+/// otherwise.
 class SqlConnection
 {
 public:
@@ -80,6 +91,30 @@ public:
 
     const DatabaseAddress& address() const { return mAddress; }
 
+    static constexpr std::chrono::seconds kLongestWork{600};
+
+    /// How long a statement of a transaction may take on a server; 0: as long as it does.
+    void limitWork(std::chrono::seconds most) { mWorkLimit = most; }
+
+    /// While it lives statements may take as long as they do.
+    class Unhurried
+    {
+    public:
+        explicit Unhurried(SqlConnection& connection)
+            : mConnection(connection)
+            , mFormer(connection.mWorkLimit)
+        {
+            connection.limitWork(std::chrono::seconds(0));
+        }
+        ~Unhurried() { mConnection.limitWork(mFormer); }
+        Unhurried(const Unhurried&) = delete;
+        Unhurried& operator=(const Unhurried&) = delete;
+
+    private:
+        SqlConnection& mConnection;
+        const std::chrono::seconds mFormer;
+    };
+
     enum class Access { Read, Write };
 
     /// Does `work` in a transaction: all of it or, when something throws, nothing. A connection that was lost since its
@@ -89,7 +124,9 @@ public:
     /// `values` stand for the question marks in `sql`.
     SqlRows ask(const QByteArray& sql, const QVariantList& values = {});
 
-    /// The same for a statement of which there are too many to be kept; until the next one of these.
+    /// The same for a statement of which there are too many to be kept; until the next one of these. A server gets it with
+    /// its values, since to prepare and to forget it would be two messages more; and it may be any that cannot be
+    /// prepared, too.
     SqlRows askOnce(const QByteArray& sql, const QVariantList& values);
 
     /// From now on a transaction begins only while the tables have this version: another program may change them at any
@@ -104,8 +141,13 @@ public:
 
 private:
     struct Opened;
+    friend class SqlRows;
 
+    AnswerWatch::Wait waiting() const;
+    [[noreturn]] void fail(const QSqlError& error) const;
+    void giveUp();
     QSqlQuery& execute(QSqlQuery& query, const QVariantList& values);
+    QString withValues(const QByteArray& sql, const QVariantList& values) const;
     QSqlQuery& run(const QByteArray& sql, const QVariantList& values);
     void begin(Access access);
     void beginOnce(Access access);
@@ -115,6 +157,8 @@ private:
     void open(IfAbsent ifAbsent);
 
     const DatabaseAddress mAddress;
+    std::chrono::seconds mWorkLimit = kLongestWork;
+    std::chrono::seconds mLimit = kLongestWork;  // of the statements that come now
     std::unique_ptr<Opened> mOpened;
     std::map<QByteArray, QSqlQuery> mStatements;  // of mOpened, and gone before it
     std::unique_ptr<QSqlQuery> mOnce;             // likewise

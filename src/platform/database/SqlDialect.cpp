@@ -27,8 +27,11 @@ SqlDialect sqlite()
     dialect.key = QStringLiteral("INTEGER");
     dialect.text = QStringLiteral("TEXT");
     dialect.bytes = QStringLiteral("BLOB");
+    dialect.alsoInIndex = QStringLiteral(", ");
     dialect.bytesOf = QStringLiteral("CAST(%1 AS BLOB)");
     dialect.holds = QStringLiteral("instr(%1, ?) > 0");
+    dialect.isOneOf = QStringLiteral("IN (SELECT value FROM json_each(?))");
+    dialect.list = QStringLiteral("[%1]");
     dialect.wordsOf = QStringLiteral("%1 GLOB ?");
     dialect.hasMatchIndex = true;
     return dialect;
@@ -40,11 +43,13 @@ SqlDialect postgres()
     dialect.driver = QStringLiteral("QPSQL");
     // Either side notices within a minute or so that the other one's machine is gone; the server then gives back
     // what the connection held.
-    dialect.connectOptions =
-        QStringLiteral("application_name=kdd;connect_timeout=10;"
-                       "keepalives=1;keepalives_idle=30;keepalives_interval=10;keepalives_count=3;"
-                       "options='-c lock_timeout=30s -c tcp_keepalives_idle=30 -c tcp_keepalives_interval=10 "
-                       "-c tcp_keepalives_count=3'");
+    dialect.connectOptions = QStringLiteral(
+        "application_name=kdd;connect_timeout=%1;"
+        "keepalives=1;keepalives_idle=30;keepalives_interval=10;keepalives_count=3;"
+        "options='-c lock_timeout=30s -c tcp_keepalives_idle=30 -c tcp_keepalives_interval=10 "
+        "-c tcp_keepalives_count=3 "
+        // Every statement of ours is short: to compile it or to share it among processes takes longer.
+        "-c jit=off -c max_parallel_workers_per_gather=0'");
     // Notices such as that a table exists already would go to standard error.
     dialect.afterOpening << QStringLiteral("SET client_min_messages = error");
     // What is registered has to be there after a power cut, whatever the server was set up for.
@@ -69,9 +74,13 @@ SqlDialect postgres()
     // In the order of bytes, as with the other engine, whatever language the server was set up for.
     dialect.text = QStringLiteral("TEXT COLLATE \"C\"");
     dialect.bytes = QStringLiteral("BYTEA");
+    dialect.alsoInIndex = QStringLiteral(") INCLUDE (");
     dialect.bytesOf = QStringLiteral("convert_to(%1, 'UTF8')");
     dialect.holds = QStringLiteral("position(CAST(? AS BYTEA) IN %1) > 0");
+    dialect.isOneOf = QStringLiteral("= ANY (CAST(? AS BIGINT[]))");
+    dialect.list = QStringLiteral("{%1}");
     dialect.wordsOf = QStringLiteral("%1 LIKE ?");
+    dialect.isRemote = true;
     return dialect;
 }
 

@@ -11,8 +11,9 @@ namespace Kxg
 /// All that the two engines want said differently; every other statement is the same for both.
 struct SqlDialect
 {
-    QString driver;            ///< of Qt
-    QString connectOptions;    ///< in the driver's form
+    QString driver;  ///< of Qt
+    QString
+        connectOptions;  ///< in the driver's form; of a server with the time in which it is to be reached [s] as %1
     QStringList afterOpening;  ///< statements that every connection begins with
     QStringList beforeSchema;  ///< statements that a new database needs once, outside a transaction
 
@@ -30,8 +31,14 @@ struct SqlDialect
     QString text;   ///< UTF-8, in the order of its bytes
     QString bytes;  ///< likewise
 
+    QString alsoInIndex;  ///< between what an index is ordered by and what it only has
+
     QString bytesOf;  ///< the bytes of a text, which stands in place of %1
     QString holds;    ///< whether bytes are among those of the column %1
+
+    // a list of numbers of any length as one value: the condition, and the value with the numbers in place of %1
+    QString isOneOf;
+    QString list;
 
     // texts of studies, which are searched for parts
     QString wordsOf;  ///< whether the column %1 matches a pattern
@@ -39,6 +46,7 @@ struct SqlDialect
     /// A pattern of `*` and of what stands for itself, as the engine writes it.
     QByteArray pattern(const QByteArray& stars) const;
 
+    bool isRemote = false;       ///< each statement is a message to a server, and another one back
     bool hasMatchIndex = false;  ///< parts are found by a table of its own, and not by the engine's choice
 
     static const SqlDialect& of(DatabaseAddress::Engine engine);

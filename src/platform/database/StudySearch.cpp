@@ -6,8 +6,12 @@
 #include "platform/database/SearchSql.h"
 #include "platform/database/SearchWords.h"
 #include "platform/database/SqlConnection.h"
+#include "platform/resources/ExResource.h"
+
+#include <QHash>
 
 #include <algorithm>
+#include <chrono>
 #include <utility>
 
 namespace Kxg
@@ -18,7 +22,9 @@ namespace
 using Access = SqlConnection::Access;
 
 constexpr int kStudyColumns = 9;
-constexpr int kSortColumns = 8;  // which the engine gives along
+constexpr int kSortColumns = 8;  // which the engine gives along with series
+
+constexpr int kShownAtOnce = 1000;  // studies, whose attributes are in memory twice meanwhile
 
 /// Of changes, where not all may be seen: so many are read at a time, and looked at for one answer.
 constexpr int kChangesAtOnce = 500;
@@ -59,6 +65,7 @@ struct StudySearch::Private
     {
         requireSchema(connection);
         bringSchemaUpToDate(connection);
+        connection.limitWork(std::chrono::seconds(Kdd::ExResource::databasePatience()));
     }
 
     const SqlDialect& dialect() const { return SqlDialect::of(connection.address().engine); }
@@ -78,24 +85,49 @@ struct StudySearch::Private
         });
     }
 
-    /// The patterns of the query that many studies have.
-    Kdd::Result findFrequent(const SearchQuery& query, QSet<QByteArray>& frequent)
+    /// The patterns of the query that many studies have. Within a transaction.
+    QSet<QByteArray> frequentOf(const SearchQuery& query)
     {
+        QSet<QByteArray> frequent;
         // The other engine knows by its statistics.
         if (!dialect().hasMatchIndex)
-            return {};
-        return transact(Access::Read, [&] {
-            for (const SearchTerm& term : query.terms) {
-                for (const QByteArray& pattern : term.patterns) {
-                    const SearchSql sql = isFrequentSql(dialect(), term, pattern);
-                    if (sql.text.isEmpty())
-                        continue;
-                    SqlRows rows = connection.ask(sql.text, sql.values);
-                    if (rows.next() && rows.truth(0))
-                        frequent.insert(pattern);
-                }
+            return frequent;
+        for (const SearchTerm& term : query.terms) {
+            for (const QByteArray& pattern : term.patterns) {
+                const SearchSql sql = isFrequentSql(dialect(), term, pattern);
+                if (sql.text.isEmpty())
+                    continue;
+                SqlRows rows = connection.ask(sql.text, sql.values);
+                if (rows.next() && rows.truth(0))
+                    frequent.insert(pattern);
             }
-        });
+        }
+        return frequent;
+    }
+
+    /// Of the page and of what is counted behind it, in order. Within a transaction.
+    QVector<int> idsOf(const SearchQuery& query)
+    {
+        const SearchSql sql = studyIdsSql(dialect(), query, limits.get(), frequentOf(query));
+        QVector<int> ids;
+        SqlRows rows = connection.askOnce(sql.text, sql.values);
+        while (rows.next())
+            ids.append(static_cast<int>(rows.number(0)));
+        return ids;
+    }
+
+    /// Appends what is shown of the studies, in the order of their ids. Within a transaction.
+    void show(const QVector<int>& ids, std::vector<FoundStudy>& found)
+    {
+        const std::size_t before = found.size();
+        QHash<int, std::size_t> places;
+        for (const int id : ids)
+            places.insert(id, before + static_cast<std::size_t>(places.size()));
+        found.resize(before + static_cast<std::size_t>(places.size()));
+        const SearchSql sql = shownStudiesSql(dialect(), ids);
+        SqlRows rows = connection.ask(sql.text, sql.values);
+        while (rows.next())
+            found[places.value(static_cast<int>(rows.number(0)), before)] = studyOf(rows, kStudyColumns);
     }
 
     /// Those of the studies that are within the limits.
@@ -166,12 +198,13 @@ Kdd::Result StudySearch::studies(const SearchQuery& query, std::vector<FoundStud
     found.clear();
     if (behind != nullptr)
         *behind = 0;
-    QSet<QByteArray> frequent;
-    const Kdd::Result counted = d->findFrequent(query, frequent);
-    if (counted.bad())
-        return counted;
-    return d->ask(studiesSql(d->dialect(), query, d->limits.get(), frequent), [&](const SqlRows& rows) {
-        takeOrCount(found, query.limit, behind, [&] { return studyOf(rows, kStudyColumns + kSortColumns); });
+    return d->transact(Access::Read, [&] {
+        const QVector<int> ids = d->idsOf(query);
+        const int page = std::min(ids.size(), std::max(0, query.limit));
+        for (int first = 0; first < page; first += kShownAtOnce)
+            d->show(ids.mid(first, std::min(kShownAtOnce, page - first)), found);
+        if (behind != nullptr)
+            *behind = ids.size() - page;
     });
 }
 
@@ -269,6 +302,7 @@ Kdd::Result StudySearch::unknownStudies(const QByteArray& after, int limit, QVec
 
 Kdd::Result StudySearch::prepare()
 {
+    const SqlConnection::Unhurried unhurried(d->connection);
     return d->transact(Access::Write, [&] {
         obtainWordsIndex(d->connection);
         QVector<qint64> studies;
@@ -286,13 +320,15 @@ Kdd::Result StudySearch::prepare()
 
 Kdd::Result StudySearch::explainStudies(const SearchQuery& query, QByteArray& plan)
 {
-    QSet<QByteArray> frequent;
-    d->findFrequent(query, frequent);
-    SearchSql sql = studiesSql(d->dialect(), query, d->limits.get(), frequent);
-    const bool isSqlite = d->connection.address().engine == DatabaseAddress::Engine::Sqlite;
-    sql.text.prepend(isSqlite ? "EXPLAIN QUERY PLAN " : "EXPLAIN (ANALYZE, BUFFERS) ");
     plan.clear();
-    return d->ask(sql, [&](const SqlRows& rows) { plan += rows.text(isSqlite ? 3 : 0) + '\n'; });
+    return d->transact(Access::Read, [&] {
+        const SearchSql sql = studyIdsSql(d->dialect(), query, d->limits.get(), d->frequentOf(query));
+        const bool isSqlite = d->connection.address().engine == DatabaseAddress::Engine::Sqlite;
+        SqlRows rows = d->connection.askOnce(
+            (isSqlite ? "EXPLAIN QUERY PLAN " : "EXPLAIN (ANALYZE, BUFFERS) ") + sql.text, sql.values);
+        while (rows.next())
+            plan += rows.text(isSqlite ? 3 : 0) + '\n';
+    });
 }
 
 }  // namespace Kxg

@@ -41,6 +41,7 @@ constexpr Setting kTlsVerify = {"KDD_TLS_VERIFY", "tls/verify", "0"};
 constexpr Setting kTlsCaFile = {"KDD_TLS_CA_FILE", "tls/cafile", ""};
 constexpr Setting kSettleSeconds = {"KDD_SETTLE_SECONDS", "archive/settleseconds", "300"};
 constexpr Setting kReadPatience = {"KDD_READ_PATIENCE", "tagfiles/readpatience", "2000"};
+constexpr Setting kDatabasePatience = {"KDD_DATABASE_PATIENCE", "database/patience", "20"};
 constexpr Setting kSessionHosts = {"KDD_SESSION_HOSTS", "web/sessionhosts", ""};
 constexpr Setting kShareConnections = {"KDD_SHARE_CONNECTIONS", "web/shareconnections", "0"};
 constexpr Setting kObjectsFolder = {"KDD_OBJECTS", "folders/objects", ""};
@@ -208,6 +209,12 @@ int ExResource::readPatience()
 {
     // Ten minutes [ms].
     return numberOf(kReadPatience, 0, 600000);
+}
+
+int ExResource::databasePatience()
+{
+    // The driver rounds less than two seconds up; ten minutes.
+    return numberOf(kDatabasePatience, 2, 600);
 }
 
 QByteArray ExResource::sessionHosts()

@@ -63,6 +63,10 @@ public:
     /// case. A merge into the largest studies takes a second or two. KDD_READ_PATIENCE, tagfiles/readpatience, "2000".
     static int readPatience();
 
+    /// How long a server of the image database is waited for, when it is to be reached or a search is to be answered [s], 2
+    /// to 600. KDD_DATABASE_PATIENCE, database/patience, "20".
+    static int databasePatience();
+
     /// The hosts that are told the session's id, separated by commas or blanks, with a port where only that one is
     /// meant. KDD_SESSION_HOSTS, web/sessionhosts, empty: all but the cloud storage and the places of tokens.
     static QByteArray sessionHosts();

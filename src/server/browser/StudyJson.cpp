@@ -37,14 +37,17 @@ const DcmTagKey kSeriesAttributes[] = {
     DCM_SeriesNumber, DCM_Modality,     DCM_SeriesDescription,     DCM_BodyPartExamined, DCM_SeriesDate,
     DCM_SeriesTime,   DCM_ProtocolName, DCM_ManufacturerModelName, DCM_StationName};
 
+/// As searches show them, also where images differ.
 template <size_t Count>
 QJsonObject attributes(const TagMap& node, const DcmTagKey (&keys)[Count])
 {
     QJsonObject object;
+    const TagMap* const image = describingImage(node);
+    const TagMap& shown = image == nullptr ? node : *image;
     for (const DcmTagKey& key : keys) {
-        const QString text = shortValue(node, key);
+        const QString text = shortValue(shown, key);
         if (!text.isEmpty())
-            object.insert(keywordOf(node, key), text);
+            object.insert(keywordOf(shown, key), text);
     }
     return object;
 }

@@ -81,11 +81,12 @@ TEST_P(MigrationTest, ADatabaseOfTheSecondSchemaKnowsWhichFilesACorrectionMoved)
     add({dicom("/d/a", "1", "1.1", "x"), dicom("/d/b", "1", "1.1", "")});
     correct({{"1", "x", "2", "2.1", "y", "changes"}, {"1", "/d/b", "2", "2.1", "/d/b", "changes"}});
     for (const char* backwards :
-         {"DROP TABLE forgotten_file", "DROP TABLE change", "DROP TABLE series_request", "DROP TABLE series_search",
-          "DROP TABLE study_modality", "DROP TABLE IF EXISTS study_parts", "DROP TABLE study_words",
-          "DROP TABLE study_answer", "DROP TABLE study_search", "DROP INDEX file_of_correction",
-          "ALTER TABLE build_request DROP COLUMN adds", "ALTER TABLE build_request DROP COLUMN since",
-          "ALTER TABLE file DROP COLUMN correction_id", "UPDATE schema_version SET version = 2"})
+         {"DROP TABLE forgotten_file", "DROP TABLE change", "DROP TABLE series_request",
+          "DROP TABLE series_search", "DROP TABLE study_modality", "DROP TABLE IF EXISTS study_parts",
+          "DROP TABLE study_words", "DROP TABLE study_answer", "DROP TABLE study_search",
+          "DROP INDEX file_of_correction", "ALTER TABLE build_request DROP COLUMN adds",
+          "ALTER TABLE build_request DROP COLUMN since", "ALTER TABLE file DROP COLUMN correction_id",
+          "UPDATE schema_version SET version = 2"})
         execute(backwards);
     open();  // and bring it up to date
     correct({{"1", "x", "1", "1.1", "x", ""}, {"1", "/d/b", "1", "1.1", "/d/b", ""}});
@@ -100,10 +101,11 @@ TEST_P(MigrationTest, ADatabaseOfTheThirdSchemaIsFoundBySearchesOnceItIsPrepared
     file.modality = "CT";
     add({file});
     for (const char* backwards :
-         {"DROP TABLE forgotten_file", "DROP TABLE change", "DROP TABLE series_request", "DROP TABLE series_search",
-          "DROP TABLE study_modality", "DROP TABLE IF EXISTS study_parts", "DROP TABLE study_words",
-          "DROP TABLE study_answer", "DROP TABLE study_search", "ALTER TABLE build_request DROP COLUMN adds",
-          "ALTER TABLE build_request DROP COLUMN since", "UPDATE schema_version SET version = 3"})
+         {"DROP TABLE forgotten_file", "DROP TABLE change", "DROP TABLE series_request",
+          "DROP TABLE series_search", "DROP TABLE study_modality", "DROP TABLE IF EXISTS study_parts",
+          "DROP TABLE study_words", "DROP TABLE study_answer", "DROP TABLE study_search",
+          "ALTER TABLE build_request DROP COLUMN adds", "ALTER TABLE build_request DROP COLUMN since",
+          "UPDATE schema_version SET version = 3"})
         execute(backwards);
     Kdd::Result result;
     const auto search = StudySearch::open(address(), result);
@@ -134,6 +136,38 @@ TEST_P(MigrationTest, AProgramThatRunsOnNeitherWritesNorReadsTablesItDoesNotKnow
     execute("UPDATE schema_version SET version = version - 1");
     EXPECT_EQ(studies(), "1   1/1/0*\n");
     EXPECT_TRUE(GetStudy("1", study).good());
+}
+
+/// With a name that no index of a server would take.
+TEST_P(MigrationTest, ADatabaseOfTheFifthSchemaGetsTheIndexOfNames)
+{
+    DicomFileRecord file = dicom("/d/a", "1.2", "1.2.1", "x");
+    file.patientName = "Doe^John";
+    add({file});
+    QByteArray name;
+    for (quint32 i = 1; name.size() < 8000; i = i * 1664525 + 1013904223)
+        name += QByteArray::number(i, 36);
+    for (const QByteArray& backwards :
+         {QByteArray("DROP INDEX study_search_by_date"),
+          QByteArray(
+              "CREATE INDEX study_search_by_date ON study_search (study_date DESC, study_time DESC, uid)"),
+          "UPDATE study_search SET name_words = '" + name + "'"})
+        execute(backwards.constData());
+    if (GetParam() == Engine::Postgres)
+        execute("ALTER TABLE study_search ALTER COLUMN name_words SET STATISTICS -1");
+    execute("UPDATE schema_version SET version = 5");
+    open();
+    DatabaseAddress parsed;
+    ASSERT_TRUE(DatabaseAddress::parse(address(), parsed).good());
+    SqlConnection connection(parsed, SqlConnection::IfAbsent::Fail);
+    SqlRows rows = connection.askOnce(
+        GetParam() == Engine::Postgres ? "SELECT attstattarget FROM pg_attribute WHERE attname = 'name_words'"
+                                         " AND attrelid = 'study_search'::regclass"
+                                       : "SELECT 1000 FROM pragma_index_info('study_search_by_date')"
+                                         " WHERE name = 'name_words'",
+        {});
+    ASSERT_TRUE(rows.next());
+    EXPECT_EQ(rows.number(0), 1000);
 }
 
 }  // namespace

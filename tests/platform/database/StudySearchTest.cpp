@@ -160,6 +160,45 @@ TEST_P(StudySearchTest, FindsByEachColumn)
     EXPECT_EQ(find({oneOf(SearchColumn::SeriesNumber, {"2"})}), "1");
 }
 
+TEST_P(StudySearchTest, NothingInAValueIsPartOfAStatement)
+{
+    const char* const kOdd = "'; \\' ? %s :1 $1 \"x\" {}";
+    build("1", aStudy("A", "20240101", kOdd, {"CT"}));
+    build("2", aStudy("B", "20240101", "P2", {"CT"}));
+    EXPECT_EQ(find({oneOf(SearchColumn::PatientID, {kOdd})}), "1");
+    EXPECT_EQ(find({oneOf(SearchColumn::PatientID, {"?", "P2"}), like(SearchColumn::PatientName, "b")}), "2");
+    EXPECT_EQ(find({like(SearchColumn::PatientID, "*\\' *")}), "1");
+}
+
+/// Of letters that no compression makes short.
+TEST_P(StudySearchTest, ValuesBeyondAllBoundsKeepNoStudyOut)
+{
+    QByteArray text;
+    for (quint32 i = 1; text.size() < 8000; i = i * 1664525 + 1013904223)
+        text += QByteArray::number(i, 36);
+    StudySearchRecord study = aStudy(("Doe^" + text).constData(), "20240101", text.constData(), {"CT", "CT"});
+    study.accessionNumber = study.studyID = text;
+    study.series[0].uid = "1.1";
+    study.series[1].uid = "1.2";
+    study.series[0].requests = {{text, text}};
+    study.series[1].modality = text;
+    build("1", study);
+    EXPECT_EQ(find({like(SearchColumn::PatientName, "doe")}), "1");
+    EXPECT_EQ(find({like(SearchColumn::PatientID, text.right(9).prepend('*').constData())}), "1");
+    EXPECT_EQ(find({}, {{SearchColumn::PatientName, false}}), "1");
+}
+
+TEST_P(StudySearchTest, TellsHowTheEngineGoesAboutASearch)
+{
+    build("1", aStudy("M\'üller?^Eva", "20240101", "P1", {"CT"}));
+    SearchQuery query;
+    query.terms = {like(SearchColumn::PatientName, "*M\'üller*")};
+    QByteArray plan;
+    EXPECT_EQ(search().explainStudies(query, plan).text().toStdString(), "");
+    EXPECT_TRUE(plan.contains(GetParam() == Engine::Sqlite ? "study_parts" : "study_search"))
+        << plan.toStdString();
+}
+
 TEST_P(StudySearchTest, ARangeOfDatesAndTimesIsOneOfMoments)
 {
     build("1", aStudy("A", "20240101", "P1", {"CT"}));

@@ -3,6 +3,7 @@
 #include "server/browser/ShownValue.h"
 
 #include <kddlib/QAData.h>
+#include <kddlib/StudyRecord.h>
 #include <kddlib/VolumeInfo.h>
 
 using namespace Kdd;
@@ -74,6 +75,23 @@ TEST_F(BrowserTest, TellsWhichNodeHoldsEachValue)
         EXPECT_EQ(attributesOf(QLatin1String(one.tag), tree).toStdString(), one.origin)
             << one.image << ' ' << one.tag;
     }
+}
+
+TEST_F(BrowserTest, ShowsOfImagesThatDifferWhatSearchesShow)
+{
+    TagFile file;
+    // Of two names the longer one is cheaper to store at the study, and it came first.
+    const auto put = [&](const char* uid, const char* name, const char* path) {
+        ASSERT_NE(file.addTagMap(image(uid, "1.3.1", "1").with(DCM_PatientName, name).map(), path, true),
+                  nullptr);
+    };
+    put("1.4.1", "Doe^Jane Elizabeth", "/d/b");
+    put("1.4.2", "Doe^J", "/d/a");
+    file.optimizeAll();
+    ASSERT_TRUE(file.writeCacheFile());
+    const QJsonObject attributes = json("/browser/studies/1.2")[QStringLiteral("attributes")].toObject();
+    EXPECT_EQ(text(attributes, "PatientName"), builtStudy(file).search.patientName.toStdString());
+    EXPECT_EQ(text(attributes, "PatientName"), "Doe^J");
 }
 
 TEST_F(BrowserTest, TellsWhichNodesItemHoldsAValueInside)

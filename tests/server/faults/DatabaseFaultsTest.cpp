@@ -75,6 +75,31 @@ TEST_P(DatabaseFaults, AreToldAndPassByThemselves)
     EXPECT_EQ(end(), 0);
 }
 
+class FrozenDatabase : public DatabaseFaults
+{
+};
+
+INSTANTIATE_TEST_SUITE_P(Engines, FrozenDatabase, testing::Values(Engine::Postgres),
+                         [](const auto&) { return std::string("Postgres"); });
+
+TEST_P(FrozenDatabase, IsNotWaitedForWithoutEnd)
+{
+    const Setting patience("KDD_DATABASE_PATIENCE", "2");
+    addTwoStudies();
+    serve({QStringLiteral("--threads"), QStringLiteral("4")});
+    expectOfAll(200);
+    {
+        const FrozenPostgres frozen;
+        expectOfAll(503);
+        EXPECT_EQ(status("/readyz").status, 503);
+        EXPECT_EQ(get("studies/1.2/metadata").status, 200) << "of the tag file alone";
+    }
+    EXPECT_TRUE(comesTrue([this] { return get("studies").status == 200; }));
+    expectOfAll(200);
+    EXPECT_TRUE(fileContent(path("log")).contains("its server did not answer"));
+    EXPECT_EQ(end(), 0);
+}
+
 class DatabaseFile : public Served
 {
 };

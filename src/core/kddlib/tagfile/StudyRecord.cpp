@@ -75,17 +75,8 @@ Kxg::BuiltStudy builtStudy(const QMap<QByteArray, TagMap*>& series, const Kxg::T
     // By path, because the order of the tree is that of arrival: two builds of the same files must say the same.
     FirstImages firstByPath;
     for (const TagMap* each : series) {
-        const TagMap* first = nullptr;
-        QByteArray firstPath;
-        for (const TagMap* image : each->children()) {
-            const QByteArray path = filePathOf(*image);
-            if (first == nullptr || path < firstPath) {
-                first = image;
-                firstPath = path;
-            }
-        }
-        if (first != nullptr)
-            firstByPath.insert(firstPath, first);
+        if (const TagMap* first = describingImage(*each))
+            firstByPath.insert(filePathOf(*first), first);
     }
     Kxg::BuiltStudy built;
     built.tagFile = stamp;

@@ -31,6 +31,11 @@ constexpr const char* kOurPrivateCreator = "Korvex";
 /// Where the image's DICOM file lies; empty when that is not known.
 KDD_EXPORT QByteArray filePathOf(const TagMap& image);
 
+/// The image that speaks for a series or study where its images differ: the first by path. What the node itself holds is
+/// only what costs least to store, and the order of its children that of arrival. Null: it has no images. Owned by the
+/// tree.
+KDD_EXPORT const TagMap* describingImage(const TagMap& node);
+
 /// A path as it is kept in (0006,7100), whatever system it was written on.
 KDD_EXPORT QByteArray forwardSlashes(QByteArray path);
 

@@ -4,6 +4,7 @@
 #include <QJsonDocument>
 
 #include <algorithm>
+#include <charconv>
 
 namespace Kdd::DicomWeb
 {
@@ -11,17 +12,38 @@ namespace
 {
 
 constexpr int kNameSize = 8;
+constexpr int kHexadecimal = 16;
 
-/// Calls `take(name, element)` for each line.
+std::string_view view(const QByteArray& bytes)
+{
+    return {bytes.constData(), static_cast<std::size_t>(bytes.size())};
+}
+
+/// Of eight hexadecimal digits; false when there is something else.
+bool readNumber(std::string_view name, AttributeNumber& number)
+{
+    const auto read = std::from_chars(name.data(), name.data() + kNameSize, number, kHexadecimal);
+    return read.ec == std::errc() && read.ptr == name.data() + kNameSize;
+}
+
+void writeNumber(AttributeNumber number, char* digits)
+{
+    static const char kDigits[] = "0123456789ABCDEF";
+    for (int i = kNameSize - 1; i >= 0; --i, number >>= 4)
+        digits[i] = kDigits[number & 0xF];
+}
+
+/// Calls `take(element)` for each line.
 template <typename Take>
 void forEachLine(const QByteArray& lines, const Take& take)
 {
-    for (int at = 0; at < lines.size();) {
-        const int end = lines.indexOf('\n', at);
-        const int stop = end < 0 ? lines.size() : end;
-        if (stop - at > kNameSize)
-            take(lines.mid(at, kNameSize), lines.mid(at + kNameSize, stop - at - kNameSize));
-        at = stop + 1;
+    std::string_view rest = view(lines);
+    while (!rest.empty()) {
+        const std::string_view line = rest.substr(0, rest.find('\n'));
+        AttributeNumber number = 0;
+        if (line.size() > kNameSize && readNumber(line, number))
+            take(AnswerObject::Element{number, line.substr(kNameSize)});
+        rest.remove_prefix(std::min(rest.size(), line.size() + 1));
     }
 }
 
@@ -51,87 +73,105 @@ int endOfValue(const QByteArray& json, int at)
 
 }  // namespace
 
-QByteArray keyName(const DcmTagKey& key)
+AttributeNumber numberOf(const DcmTagKey& key)
 {
-    const quint32 number = (quint32(key.getGroup()) << 16) | key.getElement();
-    return QByteArray::number(number, 16).toUpper().rightJustified(kNameSize, '0');
+    return (quint32(key.getGroup()) << 16) | key.getElement();
 }
 
-QByteArray elementOf(const QByteArray& lines, const QByteArray& name)
+QByteArray keyName(const DcmTagKey& key)
+{
+    QByteArray name(kNameSize, Qt::Uninitialized);
+    writeNumber(numberOf(key), name.data());
+    return name;
+}
+
+QByteArray elementOf(const QByteArray& lines, const DcmTagKey& key)
 {
     QByteArray found;
-    forEachLine(lines, [&](const QByteArray& each, const QByteArray& element) {
-        if (each == name)
-            found = element;
+    forEachLine(lines, [&, wanted = numberOf(key)](const AnswerObject::Element& each) {
+        if (each.attribute == wanted)
+            found = QByteArray(each.text.data(), static_cast<int>(each.text.size()));
     });
     return found;
 }
 
-void AnswerObject::add(const QByteArray& name, const QByteArray& element)
+void AnswerObject::add(const Element& element)
 {
-    const bool isThere =
-        std::any_of(mElements.begin(), mElements.end(), [&](const auto& each) { return each.first == name; });
+    const bool isThere = std::any_of(mElements.begin(), mElements.end(), [&](const Element& each) {
+        return each.attribute == element.attribute;
+    });
     if (!isThere)
-        mElements.emplace_back(name, element);
+        mElements.push_back(element);
 }
 
-void AnswerObject::addText(const QByteArray& name, const char* vr, const QByteArray& value)
+void AnswerObject::add(AttributeNumber attribute, QByteArray text)
 {
-    add(name, QByteArray("{\"vr\":\"") + vr + "\",\"Value\":[" + jsonText(value) + "]}");
+    // The view is of bytes that do not move with the array.
+    mOwned.push_back(std::move(text));
+    add({attribute, view(qAsConst(mOwned.back()))});
 }
 
-void AnswerObject::addNumber(const QByteArray& name, int value)
+void AnswerObject::addText(AttributeNumber attribute, const char* vr, const QByteArray& value)
 {
-    add(name, "{\"vr\":\"IS\",\"Value\":[" + QByteArray::number(value) + "]}");
+    add(attribute, QByteArray("{\"vr\":\"") + vr + "\",\"Value\":[" + jsonText(value) + "]}");
 }
 
-void AnswerObject::addLines(const QByteArray& lines, const std::vector<QByteArray>& names)
+void AnswerObject::addNumber(AttributeNumber attribute, int value)
 {
-    forEachLine(lines, [&](const QByteArray& name, const QByteArray& element) {
-        if (std::find(names.begin(), names.end(), name) != names.end())
-            add(name, element);
+    add(attribute, "{\"vr\":\"IS\",\"Value\":[" + QByteArray::number(value) + "]}");
+}
+
+void AnswerObject::addLines(const QByteArray& lines, const std::vector<AttributeNumber>& attributes)
+{
+    forEachLine(lines, [&](const Element& each) {
+        if (std::binary_search(attributes.begin(), attributes.end(), each.attribute))
+            add(each);
     });
 }
 
 void AnswerObject::addAllLines(const QByteArray& lines)
 {
-    forEachLine(lines, [&](const QByteArray& name, const QByteArray& element) { add(name, element); });
+    forEachLine(lines, [&](const Element& each) { add(each); });
 }
 
 void AnswerObject::addObject(const QByteArray& json)
 {
     // {"GGGGEEEE":{...},"GGGGEEEE":{...}}
     constexpr int kBeforeValue = kNameSize + 3;
+    mOwned.push_back(json);
+    const std::string_view all = view(qAsConst(mOwned.back()));
     for (int at = json.indexOf('"'); at > 0 && at + kBeforeValue < json.size(); at = json.indexOf('"', at)) {
         const int end = endOfValue(json, at + kBeforeValue);
-        add(json.mid(at + 1, kNameSize), json.mid(at + kBeforeValue, end - at - kBeforeValue));
+        const auto value = static_cast<std::size_t>(at + kBeforeValue);
+        AttributeNumber number = 0;
+        if (readNumber(all.substr(static_cast<std::size_t>(at) + 1), number))
+            add({number, all.substr(value, static_cast<std::size_t>(end) - value)});
         at = end;
     }
-}
-
-void AnswerObject::addMissing(const std::vector<std::pair<QByteArray, const char*>>& names)
-{
-    for (const auto& each : names)
-        add(each.first, QByteArray("{\"vr\":\"") + each.second + "\"}");
 }
 
 void AnswerObject::write(QByteArray& out)
 {
     std::sort(mElements.begin(), mElements.end(),
-              [](const auto& a, const auto& b) { return a.first < b.first; });
+              [](const Element& a, const Element& b) { return a.attribute < b.attribute; });
+    char before[] = ",\"GGGGEEEE\":";
     out += '{';
-    bool isFirst = true;
-    for (const auto& each : mElements) {
-        if (!isFirst)
-            out += ',';
-        isFirst = false;
-        out += '"' + each.first + "\":" + each.second;
+    for (std::size_t i = 0; i < mElements.size(); ++i) {
+        writeNumber(mElements[i].attribute, before + 2);
+        out.append(i == 0 ? before + 1 : before);
+        out.append(mElements[i].text.data(), static_cast<int>(mElements[i].text.size()));
     }
     out += '}';
 }
 
 QByteArray jsonText(const QByteArray& text)
 {
+    // Nearly all: what stands for itself.
+    const bool isPlain = std::all_of(text.begin(), text.end(), [](char each) {
+        return each >= ' ' && each < '\x7f' && each != '"' && each != '\\';
+    });
+    if (isPlain)
+        return '"' + text + '"';
     const QByteArray array =
         QJsonDocument(QJsonArray{QString::fromUtf8(text)}).toJson(QJsonDocument::Compact);
     return array.mid(1, array.size() - 2);

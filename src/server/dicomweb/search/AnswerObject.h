@@ -6,43 +6,56 @@
 
 #include <dcmtk/dcmdata/dctagkey.h>
 
-#include <utility>
+#include <string_view>
 #include <vector>
 
 namespace Kdd::DicomWeb
 {
 
+/// An attribute by one number, the group in its upper half.
+using AttributeNumber = quint32;
+
+AttributeNumber numberOf(const DcmTagKey& key);
+
 /// The eight hexadecimal digits of an attribute.
 QByteArray keyName(const DcmTagKey& key);
 
 /// The element of an attribute among lines as the database keeps them; empty when it is not there.
-QByteArray elementOf(const QByteArray& lines, const QByteArray& name);
+QByteArray elementOf(const QByteArray& lines, const DcmTagKey& key);
 
 /// One object of an answer, in the DICOM JSON model.
+///
+/// An answer has some thousand elements, most of them as the database has them already. So texts are not copied before
+/// they are written: whatever is handed in as a view or as lines must outlive the object.
 class AnswerObject
 {
 public:
+    struct Element
+    {
+        AttributeNumber attribute;
+        std::string_view text;
+    };
+
     /// Adds an element; one that is there already stays.
-    void add(const QByteArray& name, const QByteArray& element);
+    void add(const Element& element);
+    void add(AttributeNumber attribute, QByteArray text);
 
-    void addText(const QByteArray& name, const char* vr, const QByteArray& value);
-    void addNumber(const QByteArray& name, int value);
+    void addText(AttributeNumber attribute, const char* vr, const QByteArray& value);
+    void addNumber(AttributeNumber attribute, int value);
 
-    /// What is there of the names among the lines, or all lines.
-    void addLines(const QByteArray& lines, const std::vector<QByteArray>& names);
+    /// What is there of the attributes among the lines, or all lines. `attributes` are sorted.
+    void addLines(const QByteArray& lines, const std::vector<AttributeNumber>& attributes);
     void addAllLines(const QByteArray& lines);
 
     /// The elements of an object as `writeDicomJson` writes it.
     void addObject(const QByteArray& json);
 
-    /// Those of the pairs (name, VR) that are not there yet, without value.
-    void addMissing(const std::vector<std::pair<QByteArray, const char*>>& names);
-
     /// Appends the object; attributes stand in the order of their tags.
     void write(QByteArray& out);
 
 private:
-    std::vector<std::pair<QByteArray, QByteArray>> mElements;
+    std::vector<Element> mElements;
+    std::vector<QByteArray> mOwned;  // what some of the views show
 };
 
 /// A text as JSON has it, quotes included.

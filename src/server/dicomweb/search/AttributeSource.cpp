@@ -76,7 +76,7 @@ void collect(const TagMap& map, const QVector<DcmTagKey>& path, int depth, const
 QStringList KeptAttributes::values(const QVector<DcmTagKey>& path) const
 {
     QStringList values;
-    const QByteArray element = elementOf(mLines, keyName(path.front()));
+    const QByteArray element = elementOf(mLines, path.front());
     if (!element.isEmpty())
         collect(QJsonDocument::fromJson(element).object(), path, 0, values);
     return values;

@@ -14,35 +14,33 @@ namespace Kdd::DicomWeb
 namespace
 {
 
-using Names = std::vector<std::pair<QByteArray, const char*>>;
+using Attributes = std::vector<AttributeNumber>;
 
 // What an answer has of its level in any case, without a value where there is none.
 
-const Names& studyNames()
-{
-    static const Names kNames = {
-        {"00080020", "DA"}, {"00080030", "TM"}, {"00080050", "SH"}, {"00080090", "PN"}, {"00081030", "LO"},
-        {"00100010", "PN"}, {"00100020", "LO"}, {"00100030", "DA"}, {"00100040", "CS"}, {"00200010", "SH"}};
-    return kNames;
-}
+const AnswerObject::Element kOfStudy[] = {{0x00080020, R"({"vr":"DA"})"}, {0x00080030, R"({"vr":"TM"})"},
+                                          {0x00080050, R"({"vr":"SH"})"}, {0x00080090, R"({"vr":"PN"})"},
+                                          {0x00081030, R"({"vr":"LO"})"}, {0x00100010, R"({"vr":"PN"})"},
+                                          {0x00100020, R"({"vr":"LO"})"}, {0x00100030, R"({"vr":"DA"})"},
+                                          {0x00100040, R"({"vr":"CS"})"}, {0x00200010, R"({"vr":"SH"})"}};
 
-const Names& seriesNames()
-{
-    static const Names kNames = {
-        {"00080021", "DA"}, {"00080031", "TM"}, {"00080060", "CS"}, {"0008103E", "LO"}, {"00200011", "IS"}};
-    return kNames;
-}
+const AnswerObject::Element kOfSeries[] = {{0x00080021, R"({"vr":"DA"})"},
+                                           {0x00080031, R"({"vr":"TM"})"},
+                                           {0x00080060, R"({"vr":"CS"})"},
+                                           {0x0008103E, R"({"vr":"LO"})"},
+                                           {0x00200011, R"({"vr":"IS"})"}};
 
-const Names& patientNames()
-{
-    static const Names kNames = {
-        {"00100010", "PN"}, {"00100020", "LO"}, {"00100030", "DA"}, {"00100040", "CS"}};
-    return kNames;
-}
+const AnswerObject::Element kOfPatient[] = {{0x00100010, R"({"vr":"PN"})"},
+                                            {0x00100020, R"({"vr":"LO"})"},
+                                            {0x00100030, R"({"vr":"DA"})"},
+                                            {0x00100040, R"({"vr":"CS"})"}};
+
+constexpr AttributeNumber kPatientGroup = 0x0010;
 
 // Shown where there is a value.
-const char* const kAlsoOfSeries[] = {"00080005", "00080201", "00400244", "00400245", "00400275"};
-const char* const kAlsoOfStudy[] = {"00080005", "00080201"};
+const Attributes kAlsoOfSeries = {0x00080005, 0x00080201, 0x00400244, 0x00400245, 0x00400275};
+const Attributes kAlsoOfStudy = {0x00080005, 0x00080201};
+const Attributes kAlsoOfPatient = {0x00080005};
 
 const DcmTagKey kImageKeys[] = {
     DCM_SpecificCharacterSet,
@@ -58,14 +56,23 @@ const DcmTagKey kImageKeys[] = {
     DCM_BitsAllocated,
 };
 
-std::vector<QByteArray> wanted(const Names& names, const char* const* also, size_t numAlso,
-                               const std::vector<QByteArray>& fields)
+template <size_t n>
+Attributes wanted(const AnswerObject::Element (&always)[n], const Attributes& also, const Attributes& fields)
 {
-    std::vector<QByteArray> all(also, also + numAlso);
-    for (const auto& each : names)
-        all.push_back(each.first);
+    Attributes all = also;
+    for (const AnswerObject::Element& each : always)
+        all.push_back(each.attribute);
     all.insert(all.end(), fields.begin(), fields.end());
+    std::sort(all.begin(), all.end());
     return all;
+}
+
+/// Those that are not there yet, without value.
+template <size_t n>
+void addMissing(AnswerObject& object, const AnswerObject::Element (&always)[n])
+{
+    for (const AnswerObject::Element& each : always)
+        object.add(each);
 }
 
 void addModalities(AnswerObject& object, const QByteArray& modalities)
@@ -76,7 +83,7 @@ void addModalities(AnswerObject& object, const QByteArray& modalities)
     QByteArray list;
     for (const QByteArray& each : modalities.split('\\'))
         list += (list.isEmpty() ? "" : ",") + jsonText(each);
-    object.add("00080061", "{\"vr\":\"CS\",\"Value\":[" + list + "]}");
+    object.add(0x00080061, "{\"vr\":\"CS\",\"Value\":[" + list + "]}");
 }
 
 QByteArray ownJson(const TagMap& image, const std::vector<DcmTagKey>& keys, bool isWhole,
@@ -105,7 +112,7 @@ FoundAnswers::FoundAnswers(const SearchRequest& request, const QByteArray& root)
     , mImageKeys(std::begin(kImageKeys), std::end(kImageKeys))
 {
     const auto show = [this](const DcmTagKey& key) {
-        mFields.push_back(keyName(key));
+        mFields.push_back(numberOf(key));
         if (std::find(mImageKeys.begin(), mImageKeys.end(), key) == mImageKeys.end())
             mImageKeys.push_back(key);
     };
@@ -114,13 +121,21 @@ FoundAnswers::FoundAnswers(const SearchRequest& request, const QByteArray& root)
     // What was asked for by its value is shown.
     for (const SearchCondition& condition : request.conditions)
         show(condition.path.front());
+    std::sort(mFields.begin(), mFields.end());
+    mOfStudy = wanted(kOfStudy, kAlsoOfStudy, mFields);
+    mOfSeries = wanted(kOfSeries, kAlsoOfSeries, mFields);
+    // Of the other fields only those of the patient are the same in all studies.
+    Attributes ofPatient;
+    std::copy_if(mFields.begin(), mFields.end(), std::back_inserter(ofPatient),
+                 [](AttributeNumber each) { return each >> 16 == kPatientGroup; });
+    mOfPatient = wanted(kOfPatient, kAlsoOfPatient, ofPatient);
 }
 
 void FoundAnswers::begin(AnswerObject& object, const QByteArray& address) const
 {
-    object.addText("00080056", "CS", "ONLINE");
+    object.add({0x00080056, R"({"vr":"CS","Value":["ONLINE"]})"});
     if (!address.isEmpty())
-        object.addText("00081190", "UR", address);
+        object.addText(0x00081190, "UR", address);
 }
 
 void FoundAnswers::finish(AnswerObject& object)
@@ -146,44 +161,37 @@ QByteArray FoundAnswers::addressOf(const Kxg::FoundStudy& study) const
 void FoundAnswers::add(const Kxg::FoundPatient& patient)
 {
     AnswerObject object;
-    object.addLines(patient.attributes, wanted(patientNames(), kAlsoOfStudy, 1, {}));
-    // Of the other fields only those of the patient are the same in all studies.
-    for (const QByteArray& field : mFields) {
-        if (field.startsWith("0010"))
-            object.addLines(patient.attributes, {field});
-    }
-    object.addMissing(patientNames());
-    object.addNumber("00201200", patient.studies);
+    object.addLines(patient.attributes, mOfPatient);
+    addMissing(object, kOfPatient);
+    object.addNumber(0x00201200, patient.studies);
     finish(object);
 }
 
 void FoundAnswers::addStudy(AnswerObject& object, const Kxg::FoundStudy& study) const
 {
     addModalities(object, study.modalities);
-    object.addNumber("00201206", study.series);
-    object.addNumber("00201208", study.instances);
-    object.addText("0020000D", "UI", study.uid);
+    object.addNumber(0x00201206, study.series);
+    object.addNumber(0x00201208, study.instances);
+    object.addText(0x0020000D, "UI", study.uid);
     if (mRequest.showsAll)
         object.addAllLines(study.attributes);
     else
-        object.addLines(study.attributes,
-                        wanted(studyNames(), kAlsoOfStudy, std::size(kAlsoOfStudy), mFields));
-    object.addMissing(studyNames());
+        object.addLines(study.attributes, mOfStudy);
+    addMissing(object, kOfStudy);
 }
 
 void FoundAnswers::addSeries(AnswerObject& object, const Kxg::FoundSeries& series) const
 {
-    object.addNumber("00201209", series.instances);
-    object.addText("0020000D", "UI", series.study.uid);
-    object.addText("0020000E", "UI", series.uid);
+    object.addNumber(0x00201209, series.instances);
+    object.addText(0x0020000D, "UI", series.study.uid);
+    object.addText(0x0020000E, "UI", series.uid);
     if (mRequest.showsAll)
         object.addAllLines(series.attributes);
     else
-        object.addLines(series.attributes,
-                        wanted(seriesNames(), kAlsoOfSeries, std::size(kAlsoOfSeries), mFields));
+        object.addLines(series.attributes, mOfSeries);
     // Below a study the study's own attributes are shown where they are named.
     object.addLines(series.study.attributes, mFields);
-    object.addMissing(seriesNames());
+    addMissing(object, kOfSeries);
 }
 
 void FoundAnswers::add(const Kxg::FoundStudy& study)

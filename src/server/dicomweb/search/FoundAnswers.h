@@ -40,7 +40,11 @@ private:
 
     const SearchRequest& mRequest;
     const QByteArray& mRoot;
-    std::vector<QByteArray> mFields;
+    // Sorted: what is asked for besides, and what is shown of each level.
+    std::vector<AttributeNumber> mFields;
+    std::vector<AttributeNumber> mOfStudy;
+    std::vector<AttributeNumber> mOfSeries;
+    std::vector<AttributeNumber> mOfPatient;
     std::vector<DcmTagKey> mImageKeys;
     QByteArray mJson;
     std::vector<int> mEnds;  // of the objects in the text

@@ -21,8 +21,8 @@ constexpr int kMaxTagFiles = 500;
 // Clients only want to know that there is more.
 constexpr int kMaxRemaining = 1000;
 
-// As many are found along with a page, nearly for nothing.
-constexpr int kCounted = 100;
+// As many are found along with a page. Where a part of a text is looked for each costs as much as one on the page.
+constexpr int kCounted = 20;
 
 constexpr int kRowsAtOnce = 1000;
 constexpr int kSeriesAtOnce = 500;
