@@ -37,9 +37,10 @@ private:
     };
 
     bool lock(Entry& entry);
-    void beginFlush(Entry& entry);
+    static SystemResult flush(const Entry& entry);
     void settle();
     Result awaitFlushes();
+    Result flushFolders();
     void registerPlaced(Result result);
 
     const ObjectPlaces& mPlaces;
