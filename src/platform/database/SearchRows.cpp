@@ -239,6 +239,43 @@ SearchRowState searchRowOf(SqlConnection& connection, qint64 studyId)
     return state;
 }
 
+namespace
+{
+
+/// Whether the rows describe the study and the same series as the record does; counts apart.
+bool isDescribedAs(SqlConnection& connection, qint64 studyId, const StudySearchRecord& study)
+{
+    {
+        SqlRows answer = connection.ask("SELECT attributes FROM study_answer WHERE study_id = ?", {studyId});
+        if (!answer.next() || answer.bytes(0) != study.attributes)
+            return false;
+    }
+    std::size_t at = 0;
+    SqlRows rows = connection.ask("SELECT uid, attributes FROM series_search WHERE study_id = ? ORDER BY uid",
+                                  {studyId});
+    while (rows.next()) {
+        if (at == study.series.size() || rows.text(0) != study.series[at].uid ||
+            rows.bytes(1) != study.series[at].attributes)
+            return false;
+        ++at;
+    }
+    return at == study.series.size();
+}
+
+void putCounts(SqlConnection& connection, qint64 studyId, const StudySearchRecord& study)
+{
+    qint64 instances = 0;
+    for (const SeriesSearchRecord& series : study.series) {
+        instances += series.instances;
+        connection.change("UPDATE series_search SET instance_count = ? WHERE study_id = ? AND uid = ?"
+                          " AND instance_count <> ?",
+                          {series.instances, studyId, textValue(series.uid), series.instances});
+    }
+    connection.change("UPDATE study_search SET instance_count = ? WHERE study_id = ?", {instances, studyId});
+}
+
+}  // namespace
+
 void putSearchRows(SqlConnection& connection, qint64 studyId, const StudySearchRecord& study,
                    const TagFileStamp& tagFile)
 {
@@ -247,12 +284,16 @@ void putSearchRows(SqlConnection& connection, qint64 studyId, const StudySearchR
 
 void putRegisteredRows(SqlConnection& connection, qint64 studyId)
 {
-    if (searchRowOf(connection, studyId).isBuilt)
+    const SearchRowState state = searchRowOf(connection, studyId);
+    if (state.isBuilt)
         return;
     StudySearchRecord study = registeredStudy(connection, studyId);
     addRegisteredSeries(connection, studyId, study);
     if (study.series.empty())
         removeSearchRows(connection, studyId);
+    // Of a study that arrives image by image nothing else changes, and its words are the dearest part.
+    else if (state.isThere && isDescribedAs(connection, studyId, study))
+        putCounts(connection, studyId, study);
     else
         put(connection, studyId, study, {}, false);
 }

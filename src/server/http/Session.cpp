@@ -218,7 +218,8 @@ void Session::dispatch(bool hasBody)
     }
     mIsWithWorker = true;
     ++mHost.inFlight;
-    mHost.workers.run([self = shared_from_this()] { self->answer(); });
+    // What brings a body is answered where that is taken.
+    (hasBody ? mHost.receivers : mHost.workers).run([self = shared_from_this()] { self->answer(); });
 }
 
 /// Without a worker: what is sent is in memory.
@@ -232,7 +233,7 @@ void Session::answerAtOnce(Response response, Afterwards afterwards)
     write(std::move(response));
 }
 
-/// On a worker, as all that follows up to `sent`.
+/// On a worker or receiver, as all that follows up to `sent`.
 void Session::answer()
 {
     Response response;

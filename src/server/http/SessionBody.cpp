@@ -1,6 +1,7 @@
 #include "server/http/Session.h"
 
 #include <kddlib/LogFile.h>
+#include <poll.h>
 
 namespace Kdd::Http
 {
@@ -10,6 +11,9 @@ namespace
 // A worker that takes a body lets others have their turn after so much of it.
 constexpr int kBodyBlock = 64 * 1024;  // [bytes]
 constexpr int kBlocksPerTurn = 64;
+
+/// A client that is sending has more in a moment, in which it is cheaper to wait than to have the socket waited for [ms].
+constexpr int kMoment = 2;
 
 /// Whoever sends less [bytes/s] holds a connection for nothing.
 constexpr qint64 kSlowestBody = 1024;
@@ -41,7 +45,7 @@ private:
 
 }  // namespace
 
-/// On a worker. What was answered before the body tells what to do with that.
+/// On a receiver. What was answered before the body tells what to do with that.
 void Session::beginBody(Response response)
 {
     mSink = std::move(response.sink);
@@ -51,13 +55,10 @@ void Session::beginBody(Response response)
         endBody(std::move(response), Afterwards::Close);
         return;
     }
+    if (mSink == nullptr)
+        mSink = std::make_unique<LetGo>(std::move(response), mHost.settings.bodyBytes);
     mBodyBegan = Clock::now();
     mBodyBytes = 0;
-    if (mSink != nullptr) {
-        receiveOn();
-        return;
-    }
-    mSink = std::make_unique<LetGo>(std::move(response), mHost.settings.bodyBytes);
     receiveBody();
 }
 
@@ -108,6 +109,9 @@ void Session::takeBody()
         if (outcome == Transport::Outcome::Done) {
             mReader.add(block.constData(), count);
         } else if (outcome == Transport::Outcome::WantsRead) {
+            pollfd socket = {mConnection->descriptor(), POLLIN, 0};
+            if (::poll(&socket, 1, kMoment) > 0)
+                continue;
             mConnection->post([self = shared_from_this()] { self->awaitBody(); });
             return;
         } else {

@@ -130,6 +130,7 @@ Result ArrivedStudies::Private::registerQueued(Kxg::Catalogue& catalogue)
     if (result.good())
         result = registration.flush();
     const std::lock_guard<std::mutex> lock(mutex);
+    const std::size_t before = pending.size();
     for (const QByteArray& studyUID : registration.studies())
         obtain(studyUID);
     for (Queued* each : taken) {
@@ -140,7 +141,9 @@ Result ArrivedStudies::Private::registerQueued(Kxg::Catalogue& catalogue)
         each->result = result;
         each->isDone = true;
     }
-    changed.notify_all();
+    // What waits already is put off, and nobody has to be woken for that.
+    if (pending.size() > before)
+        changed.notify_all();
     return result;
 }
 

@@ -6,7 +6,7 @@
 #include <unistd.h>
 
 #include <algorithm>
-#include <map>
+#include <set>
 #include <utility>
 
 namespace Kdd
@@ -35,8 +35,12 @@ void ObjectBatch::add(StagedFile& file, ArrivalFault fault, const QString& reaso
         return;
     }
     if (check(entry) && lock(entry) && mPlaces.settleWithKnown(entry.input, mCatalogue, entry.object) &&
-        mPlaces.place(file, entry.input, entry.object))
-        beginFlush(entry);
+        mPlaces.place(file, entry.input, entry.object)) {
+        // The last one is waited for by this thread itself: one that comes alone then wakes no other.
+        if (!mPlaced.empty())
+            mPlaced.back()->flushed = mFlushes.begin([last = mPlaced.back()] { return flush(*last); });
+        mPlaced.push_back(&entry);
+    }
 }
 
 bool ObjectBatch::check(Entry& entry) const
@@ -68,13 +72,10 @@ bool ObjectBatch::lock(Entry& entry)
 }
 
 /// Of a file that lay there already nobody knows whether it ever was waited for.
-void ObjectBatch::beginFlush(Entry& entry)
+SystemResult ObjectBatch::flush(const Entry& entry)
 {
-    mPlaced.push_back(&entry);
-    entry.flushed = mFlushes.begin([&entry] {
-        const bool isOwn = isSameFile(entry.file->path(), entry.input.path);
-        return isOwn ? entry.file->flush() : flushFile(entry.input.path);
-    });
+    const bool isOwn = isSameFile(entry.file->path(), entry.input.path);
+    return isOwn ? entry.file->flush() : flushFile(entry.input.path);
 }
 
 std::vector<ArrivedObject> ObjectBatch::finish()
@@ -95,23 +96,14 @@ void ObjectBatch::settle()
         mLocks.release();
 }
 
-/// Files and the folders that name them are waited for together. A file that cannot be written is refused; failure: a folder
-/// cannot be.
+/// A file that cannot be written is refused; failure: a folder that names one cannot be.
 Result ObjectBatch::awaitFlushes()
 {
-    std::map<QByteArray, std::future<SystemResult>> folders;
-    for (const Entry* entry : mPlaced) {
-        const QByteArray folder = mPlaces.folderOf(entry->object);
-        if (folders.count(folder) == 0)
-            folders[folder] = mFlushes.begin([folder] { return flushFolder(folder); });
-    }
-    Result result;
-    for (auto& folder : folders) {
-        const SystemResult flushed = folder.second.get();
-        result = result.good() ? Result(flushed) : result;
-    }
-    const auto isFlushed = [](Entry* entry) {
-        const SystemResult flushed = entry->flushed.get();
+    if (mPlaced.empty())
+        return {};
+    const SystemResult last = flush(*mPlaced.back());
+    const auto isFlushed = [&](Entry* entry) {
+        const SystemResult flushed = entry->flushed.valid() ? entry->flushed.get() : last;
         if (flushed.good())
             return true;
         if (isSameFile(entry->file->path(), entry->input.path))
@@ -121,6 +113,25 @@ Result ObjectBatch::awaitFlushes()
     };
     // All are asked, for what they wait with belongs to this object.
     mPlaced.erase(std::stable_partition(mPlaced.begin(), mPlaced.end(), isFlushed), mPlaced.end());
+    return flushFolders();
+}
+
+/// After the files: as a rule the file system's journal went to the disk with these, and the names of the files with it.
+Result ObjectBatch::flushFolders()
+{
+    std::set<QByteArray> folders;
+    for (const Entry* entry : mPlaced)
+        folders.insert(mPlaces.folderOf(entry->object));
+    if (folders.size() == 1)
+        return flushFolder(*folders.begin());
+    std::vector<std::future<SystemResult>> waits;
+    for (const QByteArray& folder : folders)
+        waits.push_back(mFlushes.begin([folder] { return flushFolder(folder); }));
+    Result result;
+    for (std::future<SystemResult>& wait : waits) {
+        const SystemResult flushed = wait.get();
+        result = result.good() ? Result(flushed) : result;
+    }
     return result;
 }
 

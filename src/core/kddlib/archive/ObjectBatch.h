@@ -42,9 +42,10 @@ private:
 
     bool check(Entry& entry) const;
     bool lock(Entry& entry);
-    void beginFlush(Entry& entry);
+    static SystemResult flush(const Entry& entry);
     void settle();
     Result awaitFlushes();
+    Result flushFolders();
     void registerPlaced(Result result);
 
     const ObjectPlaces& mPlaces;
