@@ -42,6 +42,8 @@ Http::Response CorrectionBody::answer()
     QString reason;
     if (!readJob(mText, mOrder.form, mJob, reason) || !complete(reason))
         return Http::failure(400, reason);
+    if (!mayMove())
+        return Http::failure(403, QStringLiteral("Images may not be moved between these studies"));
     const Turn turn(mTurns);
     return turn ? correct() : tooManyChanges();
 }
@@ -77,6 +79,15 @@ bool CorrectionBody::complete(QString& reason)
         mJob.studyUID = other->value.toUtf8();
     }
     return true;
+}
+
+/// The study that the job was sent to has been looked at; of a move there is another one.
+bool CorrectionBody::mayMove() const
+{
+    if (mOrder.limits == nullptr || mJob.oldStudyUID.isEmpty())
+        return true;
+    const QByteArray& other = mJob.studyUID == mOrder.study ? mJob.oldStudyUID : mJob.studyUID;
+    return mSight.look(mOrder.limits, other) == Sight::Seen;
 }
 
 Http::Response CorrectionBody::correct()

@@ -54,6 +54,7 @@ Http::Response readOrder(const Http::Request& request, CorrectionOrder& order)
     order.root = request.base;
     order.caller = request.caller;
     order.id = request.id;
+    order.limits = request.studies;
     return Http::Response(0);
 }
 
@@ -117,7 +118,7 @@ Http::Response CorrectionsResource::receive(const Http::Request& request, const 
     if (response.status != 0)
         return response;
     response.status = 200;
-    response.sink = std::make_unique<CorrectionBody>(mStudies, mTurns, std::move(order));
+    response.sink = std::make_unique<CorrectionBody>(mStudies, mSight, mTurns, std::move(order));
     return response;
 }
 

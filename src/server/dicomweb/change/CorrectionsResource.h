@@ -3,6 +3,7 @@
 #include "server/dicomweb/Resource.h"
 #include "server/dicomweb/StudyShelf.h"
 #include "server/dicomweb/change/Turns.h"
+#include "server/dicomweb/search/StudySight.h"
 
 namespace Kdd::DicomWeb
 {
@@ -11,9 +12,10 @@ namespace Kdd::DicomWeb
 class CorrectionsResource : public Resource
 {
 public:
-    /// Both outlive the object.
-    CorrectionsResource(StudyShelf& studies, Turns& turns)
+    /// All outlive the object.
+    CorrectionsResource(StudyShelf& studies, const StudySight& sight, Turns& turns)
         : mStudies(studies)
+        , mSight(sight)
         , mTurns(turns)
     {
     }
@@ -31,6 +33,7 @@ public:
 
 private:
     StudyShelf& mStudies;
+    const StudySight& mSight;
     Turns& mTurns;
 };
 
