@@ -33,6 +33,7 @@ protected:
         mSettings.objects.emplace();
         mSettings.objects->folder = mStore.filePath("objects").toUtf8();
         mSettings.objects->freeBytes = 0;
+        mSettings.changes.corrections = mSettings.changes.deletions = true;
         putFile(mStore.filePath("keys.json"), mIssuer.keySet());
         const QByteArray file =
             R"({"tokens":{"issuer":"https://login.example","audience":"archive","keys":")" +
@@ -79,12 +80,11 @@ protected:
         return "Authorization: Bearer " + mIssuer.token(claims) + "\r\n";
     }
     Reply ask(const QByteArray& method, const QByteArray& path, const QByteArray& headers,
-              const QByteArray& body = {}) const
+              const QByteArray& body = {}, const QByteArray& type = "application/dicom") const
     {
         Client client(mServer->address());
-        client.send(method + ' ' + path +
-                    " HTTP/1.1\r\nHost: localhost\r\nContent-Type: application/dicom\r\n" + headers +
-                    "Content-Length: " + QByteArray::number(body.size()) + "\r\n\r\n" + body);
+        client.send(method + ' ' + path + " HTTP/1.1\r\nHost: localhost\r\nContent-Type: " + type + "\r\n" +
+                    headers + "Content-Length: " + QByteArray::number(body.size()) + "\r\n\r\n" + body);
         return client.reply(method == "HEAD" ? Client::Body::StaysBehind : Client::Body::Follows);
     }
     QByteArray get(const QByteArray& path, const QByteArray& headers) const
@@ -219,6 +219,28 @@ TEST_F(StudyLimits, FollowCorrectionsAndArrivals)
     EXPECT_EQ(ask("GET", "/dicom-web/studies/1.2/metadata", north + "If-None-Match: " + tag + "\r\n").status,
               404);
     EXPECT_EQ(get("/dicom-web/studies/1.2/series", north), "[]");
+}
+
+TEST_F(StudyLimits, KeepMovedImagesInSight)
+{
+    const auto move = [&](const QByteArray& from, const QByteArray& to, const char* preview,
+                          const QByteArray& headers) {
+        const QByteArray job = "<Job><Timestamp>20240601093000</Timestamp><Login>anna</Login><OldSUID>" +
+                               from +
+                               "</OldSUID><Substitutions><Tag Group=\"0020\" Element=\"000D\"><Value>" + to +
+                               "</Value></Tag></Substitutions></Job>";
+        return ask("POST", "/dicom-web/studies/1.2/corrections?all=true" + QByteArray(preview), headers, job,
+                   "application/xml")
+            .status;
+    };
+    const QByteArray north = token(QStringLiteral("North"));
+    for (const char* preview : {"&preview=true", ""}) {
+        EXPECT_EQ(move("1.2", "1.9", preview, north), 403) << preview;
+        EXPECT_EQ(move("1.9", "1.2", preview, north), 403) << preview;
+        EXPECT_EQ(move("1.2", "1.8", preview, north), 403) << preview << "where nobody knows who may see it";
+    }
+    EXPECT_EQ(move("1.2", "1.9", "&preview=true", token(QStringLiteral("*"))), 200);
+    EXPECT_EQ(ask("GET", "/dicom-web/studies/1.2/metadata", north).status, 200);
 }
 
 TEST_F(StudyLimits, AreRefusedWhereTheyKeepNothing)
