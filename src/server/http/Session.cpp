@@ -197,7 +197,6 @@ void Session::prepareRequest()
     mBegan = Clock::now();
     mRequest = mReader.take();
     mCaller.clear();
-    mChanged.clear();
     mRequest.peer = mPeer;
     mRequest.isEncrypted = qstrcmp(mTransport->scheme(), "https") == 0;
     mRequest.certificate = mTransport->peerName();

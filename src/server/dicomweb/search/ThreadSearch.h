@@ -17,9 +17,8 @@ public:
     {
     }
 
-    /// Runs `work` with the thread's connection, which finds studies within the limits of whoever asks and
-    /// no others. One that was lost, because the server of the database was stopped
-    /// meanwhile, is opened anew and the work done once more.
+    /// Runs `work` with the thread's connection, which finds studies within the limits of whoever asks and no others. One
+    /// that was lost, because the server of the database was stopped meanwhile, is opened anew and the work done once more.
     Result ask(const std::shared_ptr<const Kxg::StudyLimits>& limits,
                const std::function<Result(Kxg::StudySearch&)>& work) const;
 
