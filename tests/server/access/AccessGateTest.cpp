@@ -271,7 +271,8 @@ TEST_F(AccessGateTest, TellsThoseInsideWhoAsksAndWhatHeMay)
     } inside;
     mRequest.headers = {{"x-user", "anna"}};
     mRequest.method = Http::Method::Post;
-    const Http::Response told = AccessGate(mRules, RightsTable({"dicom-web"}), {}, inside).answer(mRequest);
+    const Http::Response told =
+        AccessGate(mRules, RightsTable({"dicom-web"}), {}, mLook, nullptr, inside).answer(mRequest);
     EXPECT_EQ(std::get<QByteArray>(told.body.at(0)), "anna read store correct");
 }
 

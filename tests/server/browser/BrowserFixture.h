@@ -78,7 +78,7 @@ protected:
 
     TemporaryStore mStore;
     DicomWeb::StudyShelf mShelf{1 << 30};
-    BrowserService mService{mShelf, {"pacs/dicom-web", true, true}};
+    BrowserService mService{mShelf, {"pacs/dicom-web", true, false, true, {}}};
 };
 
 }  // namespace Kdd::Browser
