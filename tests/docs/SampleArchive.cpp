@@ -74,6 +74,9 @@ QString SampleArchive::substituted(QString text) const
     text.replace(QRegularExpression(QStringLiteral("^(kdd (?:serve|receive)[^#]*)(#.*)?$")),
                  QStringLiteral("rm -f served; mkfifo served; KDD_SERVER_LISTEN=127.0.0.1:0 \\1 >served &\n"
                                 "read -r line <served; kill $!; wait $!"));
+    // A worker is interrupted as one is by hand.
+    text.replace(QRegularExpression(QStringLiteral("^(kdd build --forever[^#]*)(#.*)?$")),
+                 QStringLiteral("timeout --preserve-status --signal=INT 1 \\1"));
     // The door builds and tests everything, this test included: here it only has to know the word.
     text.replace(QRegularExpression(QStringLiteral("^\\./dev (\\w+)")),
                  QStringLiteral(KDD_SOURCES "/dev | grep '^  \\1 '"));

@@ -260,8 +260,10 @@ SearchSql studiesFrom(const SqlDialect& dialect, const SearchQuery& query, const
                       bool isListed, const QSet<QByteArray>& frequent = {})
 {
     Conditions conditions(dialect, limits, frequent);
-    // The list of a modality is kept in its order. Walking it looks at nothing that is not wanted.
-    const SearchTerm* leading = isListed ? leadingModality(dialect, query, frequent) : nullptr;
+    // The list of a modality is kept in its order. Walking it looks at nothing that is not wanted, but what somebody may see
+    // is no part of it.
+    const SearchTerm* leading =
+        isListed && limits == nullptr ? leadingModality(dialect, query, frequent) : nullptr;
     for (const SearchTerm& term : query.terms) {
         if (&term != leading)
             conditions.add(term);

@@ -21,7 +21,6 @@ namespace
 constexpr int kMaxShortLength = 200;
 
 // Enough that no two images of a study meet.
-constexpr int kDigestDigits = 24;
 
 /// Not between the two halves of one character.
 QString cut(const QString& text, int length)

@@ -140,9 +140,10 @@ TEST_F(StudyLimits, AnswerOfEveryResourceAsIfOthersDidNotExist)
         for (const QByteArray& path : paths()) {
             const std::string hidden = sameOf(method, path, "1.9", limited);
             EXPECT_EQ(hidden, sameOf(method, path, "1.8", limited)) << method << ' ' << path.constData();
+            if (*method != 'G')
+                continue;
             EXPECT_EQ(hidden.find("1.9.3"), std::string::npos) << hidden;
-            if (*method == 'G')
-                seen += hidden != sameOf(method, path, "1.9", whole) ? 1 : 0;
+            seen += hidden != sameOf(method, path, "1.9", whole) ? 1 : 0;
         }
         if (*method == 'G') {
             EXPECT_GE(seen, 20) << "there is something to hide";
@@ -225,10 +226,9 @@ TEST_F(StudyLimits, KeepMovedImagesInSight)
 {
     const auto move = [&](const QByteArray& from, const QByteArray& to, const char* preview,
                           const QByteArray& headers) {
-        const QByteArray job = "<Job><Timestamp>20240601093000</Timestamp><Login>anna</Login><OldSUID>" +
-                               from +
-                               "</OldSUID><Substitutions><Tag Group=\"0020\" Element=\"000D\"><Value>" + to +
-                               "</Value></Tag></Substitutions></Job>";
+        const QByteArray job =
+            "<Job><Timestamp>20240601093000</Timestamp><Login>anna</Login><Substitutions OldSUID=\"" + from +
+            "\"><Tag Group=\"0020\" Element=\"000D\"><Value>" + to + "</Value></Tag></Substitutions></Job>";
         return ask("POST", "/dicom-web/studies/1.2/corrections?all=true" + QByteArray(preview), headers, job,
                    "application/xml")
             .status;

@@ -2,6 +2,7 @@
 #include "server/browser/AttributeTree.h"
 #include "server/browser/ShownValue.h"
 
+#include <kddlib/OwnAttributes.h>
 #include <kddlib/QAData.h>
 #include <kddlib/StudyRecord.h>
 #include <kddlib/VolumeInfo.h>
@@ -82,8 +83,9 @@ TEST_F(BrowserTest, ShowsOfImagesThatDifferWhatSearchesShow)
     TagFile file;
     // Of two names the longer one is cheaper to store at the study, and it came first.
     const auto put = [&](const char* uid, const char* name, const char* path) {
-        ASSERT_NE(file.addTagMap(image(uid, "1.3.1", "1").with(DCM_PatientName, name).map(), path, true),
-                  nullptr);
+        TagMap* added = image(uid, "1.3.1", "1").with(DCM_PatientName, name).map();
+        ASSERT_EQ(file.addTagMap(added, path, true), added);
+        added->putAndInsertValue(kFilePath, VrCode::LO, path);
     };
     put("1.4.1", "Doe^Jane Elizabeth", "/d/b");
     put("1.4.2", "Doe^J", "/d/a");

@@ -258,7 +258,8 @@ TEST_F(ChangeTest, TellsInTheTrailWhichStudiesAndHowManyImages)
                          studies.join(QLatin1Char(',')) + QLatin1Char(' ') +
                          told[QLatin1String("images")].toVariant().toString();
     }
-    EXPECT_EQ(lines.join(QLatin1Char(';')).toStdString(), "POST 1.2,1.5 2;POST 1.5 ;DELETE 1.5 2");
+    EXPECT_EQ(lines.join(QLatin1Char(';')).toStdString(),
+              "POST 1.2 1;POST 1.2 1;POST 1.2 1;POST 1.2,1.5 2;POST 1.5 ;DELETE 1.5 2");
 }
 
 TEST_F(ChangeTest, TellsWhoeverComesWhileOthersWorkOnTheStudy)

@@ -84,7 +84,7 @@ Http::Response CorrectionsResource::answer(const Http::Request& request, const R
     if (form < 0)
         return Http::failure(406, QStringLiteral("Corrections are told as application/json or text/csv"));
     if (mStudies.arrivals() != nullptr)
-        mStudies.arrivals()->bringInOwn(path.study);
+        mStudies.arrivals()->bringIn(path.study);
     std::shared_ptr<const ServedStudy> study;
     const Presence presence = mStudies.find(path.study, study);
     if (presence != Presence::Found)
