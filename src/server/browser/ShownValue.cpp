@@ -20,8 +20,6 @@ namespace
 // Names, dates, descriptions: what stands in one line of a page.
 constexpr int kMaxShortLength = 200;
 
-// Enough that no two images of a study meet.
-
 /// Not between the two halves of one character.
 QString cut(const QString& text, int length)
 {
