@@ -96,7 +96,7 @@ class DeployedSite:
         command = [shutil.which("nginx", path=os.environ.get("PATH", "") + ":/usr/sbin"), "-p", self.folder, "-c", path,
                    "-e", f"{self.folder}/nginx.log"]
         subprocess.run([*command, "-t"], check=True, stderr=self.log)
-        self.processes["nginx"] = subprocess.Popen(command, stderr=self.log)
+        self.processes["nginx"] = subprocess.Popen(command, stdout=self.log, stderr=self.log)
 
     def start_server(self, number):
         server = subprocess.Popen(
@@ -139,9 +139,12 @@ class DeployedSite:
         return files
 
     def close(self):
-        for name in ("server0", "server1", "worker0", "worker1", "nginx"):
+        for name in ("server0", "server1", "worker0", "worker1"):
             if name in self.processes:
                 self.end(name, signal.SIGKILL)
+        # Its own workers would outlive it if it were killed.
+        if "nginx" in self.processes:
+            self.end("nginx")
         if "postgres" in self.processes:
             self.end("postgres", signal.SIGINT)
         self.log.close()
