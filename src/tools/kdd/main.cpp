@@ -5,6 +5,8 @@
 #include "tools/kdd/HelpText.h"
 #include "tools/kdd/ManPage.h"
 
+#include <QThread>
+
 #include <CLI/CLI.hpp>
 #include <kddlib/LogFile.h>
 
@@ -81,6 +83,9 @@ Outcome run(int argc, char** argv)
 
 int main(int argc, char** argv)
 {
+    // Qt takes the thread that it sees first for the main one, and keeps what belongs to any other until that thread ends:
+    // a server's worker must not come first.
+    QThread::currentThread();
     try {
         return static_cast<int>(Kdd::run(argc, argv));
     } catch (const std::exception& fault) {
