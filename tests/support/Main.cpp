@@ -1,3 +1,5 @@
+#include <QThread>
+
 #include <gmock/gmock.h>
 
 #include <clocale>
@@ -6,6 +8,8 @@
 int main(int argc, char* argv[])
 {
     std::setlocale(LC_ALL, "");
+    // Qt takes the thread that it sees first for the main one, and it must not be a server's.
+    QThread::currentThread();
     testing::InitGoogleMock(&argc, argv);
     return RUN_ALL_TESTS();
 }

@@ -198,6 +198,7 @@ void ArchiveModel::complete(const std::string& study, ModelStudy arrivals, bool 
         content[image.first] = image.second;
     put(study, content);
     mWaiting.erase(study);
+    mChanged.erase(study);
     mUnsettled.insert(study);
 }
 
@@ -211,10 +212,13 @@ bool ArchiveModel::build(const std::string& study)
         const std::string& path = image.second.path;
         const auto file = mDisk.find(path);
         const ModelFile& known = image.second.shows;
-        const bool isThat = file != mDisk.end() && file->second.study == known.study &&
-                            file->second.series == known.series && file->second.sop == known.sop;
+        // Of a file that was registered without UID nothing is known that it could contradict.
+        const bool isThat =
+            file != mDisk.end() && file->second.study == known.study &&
+            (known.sop.empty() || (file->second.series == known.series && file->second.sop == known.sop));
         if (isThat) {
-            content[image.first] = {path, edited(image.first, file->second)};
+            const std::string key = keyOf(path, file->second);
+            content[key] = {path, edited(key, file->second)};
             continue;
         }
         isWhole = false;

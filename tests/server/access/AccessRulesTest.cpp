@@ -48,6 +48,7 @@ TEST(AccessRules, OpenNoDoorByASlip)
         {"", "no JSON object"},
         {"[]", "no JSON object"},
         {R"({"anyone":[],"anyone":["read"]})", "says something twice"},
+        {R"({"anyone":[],"\u0061nyone":["read"]})", "says something twice"},
         {"{}", "it lets nobody in"},
         {R"({"anyone":[]})", "it lets nobody in"},
         {R"({"anyone":["reed"]})", "anyone has a right that is none"},

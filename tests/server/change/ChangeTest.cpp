@@ -72,7 +72,7 @@ const Sent kRefused[] = {
     {"?all=true", "application/xml", "<Job><Substitutions OldSUID='../1.2'/></Job>", 400, "no UID"},
     {"?series=1.2.9", "application/json", kRename, 404, R"("notFound":["1.2.9"])"},
     {"?all=true", "application/json", R"({"tags":[{"tag":"00100030","value":"soon"}]})", 409,
-     "Image 1.2.3.1: Tag (0010,0030): \"soon\" is no date"},
+     ": Tag (0010,0030): \"soon\" is no date"},
     {"?all=true", "application/json", R"({"tags":[{"tag":"00020010","value":"1.2"}]})", 409, "(0002,0010)"},
     {"?all=true", "application/json", R"({"oldStudy":"1.7","tags":[]})", 404, R"("images":0)"},
 };

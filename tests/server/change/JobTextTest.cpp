@@ -77,7 +77,7 @@ const std::pair<const char*, const char*> kFaults[] = {
     {R"({"tags":[{"tag":"00100010"}]})", "Tag (0010,0010) has no Value"},
     {R"({"tags":[{"tag":"00100010","value":null}]})", "value is no text"},
     {R"({"tags":[{"tag":"00100010","value":["a"]}]})", "value is no text"},
-    {R"({"tags":[{"tag":"00100010","value":"\ud83d"}]})", "characters"},
+    {R"({"tags":[{"tag":"00100010","value":"\ud83d"}]})", "no JSON object"},
     {R"({"tags":[{"tag":"00100010","value":"\ufffe"}]})", "characters"},
     {R"({"tags":[{"tag":"00100010","value":"a","vr":"PN"}]})", "\"vr\" is nothing"},
     {R"({"tags":[{"tag":"00100010","value":"a"},{"tag":"00100010","value":"b"}]})", "stands twice"},
