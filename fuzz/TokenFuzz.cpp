@@ -1,8 +1,8 @@
 // Tokens, and the keys that they are signed with. Nobody has shown yet who sends the one.
 
 #include "fuzz/Property.h"
+#include "server/access/Base64Url.h"
 #include "server/access/SignedToken.h"
-#include "server/access/StrictJson.h"
 #include "server/access/TokenClaims.h"
 
 using namespace Kdd;

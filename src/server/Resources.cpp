@@ -1,5 +1,7 @@
 #include "server/Resources.h"
 
+#include "server/dicomweb/change/CorrectionsResource.h"
+#include "server/dicomweb/change/RemovalResource.h"
 #include "server/dicomweb/metadata/MetadataResource.h"
 #include "server/dicomweb/render/RenderedResource.h"
 #include "server/dicomweb/render/ThumbnailResource.h"
@@ -50,6 +52,8 @@ std::vector<std::unique_ptr<DicomWeb::Resource>> makeResources(ServedArchive& ar
     resources.push_back(std::make_unique<UriResource>(archive.studies, archive.objects));
     if (archive.arrivals != nullptr)
         resources.push_back(std::make_unique<StoreResource>(*archive.arrivals, archive.storeLimits));
+    resources.push_back(std::make_unique<CorrectionsResource>(*archive.studies, *archive.changes));
+    resources.push_back(std::make_unique<RemovalResource>(archive.catalogue, *archive.changes));
     return resources;
 }
 

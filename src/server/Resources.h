@@ -2,6 +2,7 @@
 
 #include "server/dicomweb/Resource.h"
 #include "server/dicomweb/StudyShelf.h"
+#include "server/dicomweb/change/Turns.h"
 #include "server/dicomweb/retrieve/ObjectShelf.h"
 #include "server/dicomweb/search/ThreadSearch.h"
 #include "server/dicomweb/store/StoreBody.h"
@@ -24,6 +25,8 @@ struct ServedArchive
     DicomWeb::ThreadSearch database{Kxg::DatabaseServer()};
     std::unique_ptr<DicomWeb::ArrivalService> arrivals;  ///< null where no objects are taken
     DicomWeb::StoreLimits storeLimits;
+    DicomWeb::ThreadCatalogue catalogue{Kxg::DatabaseServer()};  ///< for who removes something
+    std::unique_ptr<DicomWeb::Turns> changes;                    ///< of those who correct or remove
 };
 
 /// All that answers below the prefix of DICOMweb, in the order in which they are asked whether a path is theirs. The

@@ -109,6 +109,19 @@ int affordableConnections(int wanted)
     return std::min(wanted, most);
 }
 
+/// Of what callers may have a right to.
+QVector<QByteArray> possibleChanges(const ServerSettings& settings)
+{
+    QVector<QByteArray> changes;
+    if (settings.objects)
+        changes.append("store");
+    if (settings.changes.corrections)
+        changes.append("correct");
+    if (settings.changes.deletions)
+        changes.append("delete");
+    return changes;
+}
+
 std::unique_ptr<Access::AuditTrail> makeTrail(const ServerSettings& settings,
                                               const QVector<QByteArray>& prefix)
 {
@@ -165,6 +178,7 @@ struct Server::Private
         stopTime = settings.http.stop;
         archive.arrivals = std::move(arrivals);
         archive.storeLimits = settings.store;
+        archive.changes = std::make_unique<DicomWeb::Turns>(settings.changes);
         archive.studies->setArrivals(archive.arrivals.get());
         router.add(prefix, std::make_unique<DicomWeb::DicomWebService>(prefix.size(),
                                                                        makeResources(archive, metrics)));
@@ -174,6 +188,7 @@ struct Server::Private
         browser.dicomWeb = prefix.toList().join('/');
         browser.hasViewer = !settings.viewer.isEmpty();
         browser.hasThumbnails = true;
+        browser.changes = possibleChanges(settings);
         router.add({}, std::make_unique<Browser::BrowserService>(*archive.studies, browser));
         if (settings.status)
             status = std::make_unique<Http::HttpServer>(statusSettings(settings), statusGuard, unobserved);
@@ -216,6 +231,8 @@ std::unique_ptr<Server> Server::make(ServerSettings settings, Result& result)
     if (result.bad())
         return nullptr;
     settings.http.connections = affordableConnections(settings.http.connections);
+    // Half of the threads at most change something, so that others are answered meanwhile.
+    settings.changes.most = std::max(1, settings.http.workers / 2);
     if (!settings.access)
         settings.access = Access::AccessRules::open();
     if (settings.access->certificates)

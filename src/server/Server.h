@@ -2,6 +2,7 @@
 
 #include "server/access/AccessRules.h"
 #include "server/access/AddressGuard.h"
+#include "server/dicomweb/change/ChangeRules.h"
 #include "server/dicomweb/store/StoreBody.h"
 #include "server/http/HttpSettings.h"
 
@@ -26,6 +27,7 @@ struct ServerSettings
     QString viewer;                      ///< folder of a viewer's files, served under /viewer; empty: none
     std::optional<ObjectRules> objects;  ///< that are taken; without it none are
     DicomWeb::StoreLimits store;
+    DicomWeb::ChangeRules changes;
     std::chrono::milliseconds slow{2000};  ///< requests that take longer are told in the log
 };
 

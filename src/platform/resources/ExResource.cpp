@@ -47,6 +47,8 @@ constexpr Setting kObjectsFolder = {"KDD_OBJECTS", "folders/objects", ""};
 constexpr Setting kSameUid = {"KDD_SAME_UID", "archive/sameuid", "refuse"};
 constexpr Setting kFreeSpace = {"KDD_FREE_SPACE", "archive/freespace", "1024"};
 constexpr Setting kObjectSize = {"KDD_OBJECT_SIZE", "archive/objectsize", "4096"};
+constexpr Setting kServerCorrections = {"KDD_SERVER_CORRECTIONS", "server/corrections", "0"};
+constexpr Setting kServerDeletions = {"KDD_SERVER_DELETIONS", "server/deletions", "0"};
 constexpr Setting kServerStow = {"KDD_SERVER_STOW", "server/stow", "0"};
 constexpr Setting kServerRequestSize = {"KDD_SERVER_REQUEST_SIZE", "server/requestsize", "65536"};
 constexpr Setting kServerListen = {"KDD_SERVER_LISTEN", "server/listen", "127.0.0.1:8042"};
@@ -240,6 +242,16 @@ int ExResource::objectSize()
 bool ExResource::serverTakesObjects()
 {
     return valueOf(kServerStow) == "1";
+}
+
+bool ExResource::serverTakesCorrections()
+{
+    return valueOf(kServerCorrections) == "1";
+}
+
+bool ExResource::serverDeletes()
+{
+    return valueOf(kServerDeletions) == "1";
 }
 
 int ExResource::serverRequestSize()

@@ -95,6 +95,11 @@ public:
     /// Whether it takes objects: only when the value is 1. KDD_SERVER_STOW, server/stow, "0".
     static bool serverTakesObjects();
 
+    /// Whether it takes corrections, and whether it deletes: only when the value is 1. KDD_SERVER_CORRECTIONS,
+    /// server/corrections, "0"; KDD_SERVER_DELETIONS, server/deletions, "0".
+    static bool serverTakesCorrections();
+    static bool serverDeletes();
+
     /// How large a request with objects may be [MiB], 1 to 16,777,216. KDD_SERVER_REQUEST_SIZE, server/requestsize, "65536".
     static int serverRequestSize();
 

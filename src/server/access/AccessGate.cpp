@@ -106,7 +106,12 @@ Http::Response AccessGate::decide(const Http::Request& request, const Asked& ask
         return isNamed ? noRight() : stranger();
     if (asked.right != Right::Read && mOrigins.isForeign(request))
         return Http::failure(403, QStringLiteral("Pages of other origins may change nothing here"));
-    Http::Response response = mInner.answer(withoutSecrets(request));
+    Http::Request known = withoutSecrets(request);
+    known.caller = caller.subject;
+    for (const auto& each : kRightNames)
+        if (caller.rights.testFlag(each.right))
+            known.rights.append(each.name);
+    Http::Response response = mInner.answer(known);
     // What one may see is not for those whom a proxy serves from its store.
     if (isNamed && !hasHeader(response, "Cache-Control"))
         response.addHeader("Cache-Control", "private");

@@ -1,7 +1,7 @@
 #include "server/access/AccessRules.h"
 
 #include "server/access/HostName.h"
-#include "server/access/StrictJson.h"
+#include "server/http/StrictJson.h"
 
 #include <QFile>
 #include <QJsonArray>
@@ -16,13 +16,6 @@ namespace
 {
 
 constexpr qint64 kLongestFile = 1024 * 1024;  // [bytes]; some ten thousand names
-
-const struct
-{
-    const char* name;
-    Right right;
-} kRights[] = {
-    {"read", Right::Read}, {"store", Right::Store}, {"correct", Right::Correct}, {"delete", Right::Delete}};
 
 /// One object of the file. Whatever is asked of it is taken as known; what is left then nobody knows. The first fault
 /// counts.
@@ -119,9 +112,9 @@ private:
         const QJsonArray items = value.toArray();
         for (const QJsonValue item : items) {
             const auto* const found =
-                std::find_if(std::begin(kRights), std::end(kRights),
+                std::find_if(std::begin(kRightNames), std::end(kRightNames),
                              [&](const auto& each) { return item.toString() == QLatin1String(each.name); });
-            if (found == std::end(kRights))
+            if (found == std::end(kRightNames))
                 fail(name, "has a right that is none: there are read, store, correct and delete");
             else
                 rights |= found->right;
@@ -227,7 +220,7 @@ AccessRules AccessRules::open()
 Result AccessRules::parse(const QByteArray& text, AccessRules& rules)
 {
     QJsonObject object;
-    if (!parseObject(text, object))
+    if (!Http::parseObject(text, object))
         return Result::failure(QStringLiteral("it is no JSON object, or says something twice"));
     Result result;
     AccessRules made;

@@ -73,9 +73,21 @@ QByteArray AuditTrail::lineOf(const Http::Exchange& exchange) const
                         {QStringLiteral("ms"), static_cast<qint64>(ms)},
                         {QStringLiteral("whole"), exchange.isWhole},
                         {QStringLiteral("request"), QString::fromLatin1(request.id)}};
-    // Else it is a text that a client made up, and might be a name.
-    if (DicomWeb::isUID(asked.study))
-        line.insert(QStringLiteral("studies"), QJsonArray{QString::fromLatin1(asked.study)});
+    QVector<QByteArray> studies;
+    if (exchange.effect) {
+        studies = exchange.effect->studies;
+        line.insert(QStringLiteral("images"), exchange.effect->images);
+    }
+    if (!studies.contains(asked.study))
+        studies.prepend(asked.study);
+    QJsonArray named;
+    for (const QByteArray& study : qAsConst(studies)) {
+        // Else it is a text that a client made up, and might be a name.
+        if (DicomWeb::isUID(study))
+            named.append(QString::fromLatin1(study));
+    }
+    if (!named.isEmpty())
+        line.insert(QStringLiteral("studies"), named);
     if (mProxies.contains(request.peer))
         if (const QByteArray client = clientOf(request); !client.isEmpty())
             line.insert(QStringLiteral("client"), QString::fromLatin1(client));

@@ -65,7 +65,11 @@ void Origins::mark(const Http::Request& request, Http::Response& response) const
 bool Origins::isForeign(const Http::Request& request) const
 {
     const QByteArray origin = request.header("origin");
-    return !origin.isNull() && !isKnown(origin) && origin != originOf(request.base);
+    if (!origin.isNull())
+        return !isKnown(origin) && origin != originOf(request.base);
+    // Some requests of pages come without their origin; then the browser may say how far that is from here.
+    const QByteArray site = request.header("sec-fetch-site");
+    return !site.isNull() && site != "same-origin" && site != "none";
 }
 
 }  // namespace Kdd::Access

@@ -1,6 +1,7 @@
 #include "server/access/SignedToken.h"
 
-#include "server/access/StrictJson.h"
+#include "server/access/Base64Url.h"
+#include "server/http/StrictJson.h"
 
 #include <QList>
 
@@ -53,9 +54,9 @@ bool SignedToken::parse(const QByteArray& token, SignedToken& read)
     QByteArray claims;
     QJsonObject headerObject;
     SignedToken made;
-    if (!decodeBase64Url(parts[0], header) || !parseObject(header, headerObject) ||
+    if (!decodeBase64Url(parts[0], header) || !Http::parseObject(header, headerObject) ||
         !readHeader(headerObject, made) || !decodeBase64Url(parts[1], claims) ||
-        !parseObject(claims, made.claims) || !decodeBase64Url(parts[2], made.signature) ||
+        !Http::parseObject(claims, made.claims) || !decodeBase64Url(parts[2], made.signature) ||
         made.signature.isEmpty())
         return false;
     made.text = parts[0] + '.' + parts[1];

@@ -1,6 +1,7 @@
 #include "server/access/TokenKeys.h"
 
-#include "server/access/StrictJson.h"
+#include "server/access/Base64Url.h"
+#include "server/http/StrictJson.h"
 
 #include <QJsonArray>
 
@@ -139,7 +140,7 @@ std::shared_ptr<const TokenKeys> TokenKeys::read(const QByteArray& text, Result&
     QJsonObject set;
     const auto keys = std::make_shared<TokenKeys>();
     result = {};
-    if (!parseObject(text, set) || !set.value(QLatin1String("keys")).isArray()) {
+    if (!Http::parseObject(text, set) || !set.value(QLatin1String("keys")).isArray()) {
         result = Result::failure(QStringLiteral("it is no set of keys"));
         return nullptr;
     }

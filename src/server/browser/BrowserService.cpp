@@ -6,6 +6,8 @@
 #include "server/browser/StudySizes.h"
 #include "server/dicomweb/ResourcePath.h"
 
+#include <QJsonArray>
+
 #include <kddlib/TagFile.h>
 
 namespace Kdd::Browser
@@ -89,9 +91,15 @@ Http::Response BrowserService::find(const Http::Request& request) const
 
 Http::Response BrowserService::config(const Http::Request& request) const
 {
+    QJsonArray may;
+    for (const QByteArray& right : mSettings.changes)
+        if (request.rights.contains(right))
+            may.append(QString::fromLatin1(right));
     return jsonAnswer(request, {{QStringLiteral("dicomWeb"), QString::fromUtf8(mSettings.dicomWeb)},
                                 {QStringLiteral("viewer"), mSettings.hasViewer},
-                                {QStringLiteral("thumbnails"), mSettings.hasThumbnails}});
+                                {QStringLiteral("thumbnails"), mSettings.hasThumbnails},
+                                {QStringLiteral("may"), may},
+                                {QStringLiteral("caller"), QString::fromUtf8(request.caller)}});
 }
 
 Http::Response BrowserService::lookAt(const QByteArray& uid, const Look& look) const

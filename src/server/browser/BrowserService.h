@@ -15,13 +15,14 @@ struct BrowserSettings
     QByteArray dicomWeb = "dicom-web";  ///< where DICOMweb stands, without "/" at either end
     bool hasViewer = false;             ///< a viewer stands under "viewer/"
     bool hasThumbnails = false;         ///< DICOMweb renders images that have no stored preview
+    QVector<QByteArray> changes;        ///< rights that are of use on this server, beside "read"
 };
 
 /// The study browser: its page, and what it tells of studies beyond DICOMweb, as JSON from their tag files.
 ///
 ///     /                                                   the page
 ///     /page/{file}                                        what it consists of
-///     /browser/config                                     what else stands on this server
+///     /browser/config                                     what else stands on this server, and what the caller may change
 ///     /browser/studies/{s}                                `studyJson`
 ///     /browser/studies/{s}/sizes                          `sizesJson`
 ///     /browser/studies/{s}/corrections                    `correctionsOf`

@@ -32,11 +32,6 @@ QString cut(const QString& text, int length)
 
 }  // namespace
 
-QString keyDigits(const DcmTagKey& key)
-{
-    return QString::asprintf("%04X%04X", unsigned(key.getGroup()), unsigned(key.getElement()));
-}
-
 QString keywordOf(const TagMap& node, const DcmTagKey& key)
 {
     DcmTag tag(key, node.privateCreator(key));
@@ -70,13 +65,6 @@ ShownValue shownValue(const TagMap& node, const DcmTagKey& key, const QByteArray
 QString shortValue(const TagMap& node, const DcmTagKey& key)
 {
     return shownValue(node, key, characterSetOf(node), kMaxShortLength).text;
-}
-
-QByteArray publicKey(const QByteArray& key)
-{
-    if (DicomWeb::isUID(key))
-        return key;
-    return "object-" + QCryptographicHash::hash(key, QCryptographicHash::Sha256).toHex().left(kDigestDigits);
 }
 
 }  // namespace Kdd::Browser

@@ -1,5 +1,7 @@
 #pragma once
 
+#include "server/dicomweb/change/ObjectName.h"
+
 #include <QByteArray>
 #include <QString>
 
@@ -30,8 +32,8 @@ struct ShownValue
     bool isCut() const { return length > text.size(); }
 };
 
-/// "00100010", as addresses and JSON have it.
-QString keyDigits(const DcmTagKey& key);
+using DicomWeb::keyDigits;
+using DicomWeb::publicKey;
 
 /// The dictionary's keyword of a key that the node shows, private ones through their creator; empty when it has none.
 QString keywordOf(const TagMap& node, const DcmTagKey& key);
@@ -48,9 +50,5 @@ ShownValue shownValue(const TagMap& node, const DcmTagKey& key, const QByteArray
 
 /// The same for a single short value by the node's own character set; empty when there is none.
 QString shortValue(const TagMap& node, const DcmTagKey& key);
-
-/// The name of a series or an image in addresses: its UID. Of those that have none, or something else in its place, a digest: images
-/// without UID are known by the path of their file, which concerns nobody outside.
-QByteArray publicKey(const QByteArray& key);
 
 }  // namespace Kdd::Browser

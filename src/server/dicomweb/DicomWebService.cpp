@@ -9,10 +9,11 @@ namespace Kdd::DicomWeb
 namespace
 {
 
-Http::Response methodsOnly(int status, bool canPost)
+Http::Response methodsOnly(int status, bool canPost, bool canDelete)
 {
     Http::Response response(status);
-    response.addHeader("Allow", canPost ? "GET, HEAD, OPTIONS, POST" : "GET, HEAD, OPTIONS");
+    response.addHeader("Allow", QByteArray("GET, HEAD, OPTIONS") + (canPost ? ", POST" : "") +
+                                    (canDelete ? ", DELETE" : ""));
     return response;
 }
 
@@ -32,11 +33,12 @@ Http::Request DicomWebService::below(const Http::Request& request) const
     return made;
 }
 
-/// Null when nothing can be sent there.
-Resource* DicomWebService::receiver(const ResourcePath& path) const
+/// The first that can do that with what the path names; null: none.
+Resource* DicomWebService::find(bool (Resource::*can)(const ResourcePath&) const,
+                                const ResourcePath& path) const
 {
     const auto found = std::find_if(mResources.begin(), mResources.end(),
-                                    [&](const auto& resource) { return resource->receives(path); });
+                                    [&](const auto& resource) { return ((*resource).*can)(path); });
     return found == mResources.end() ? nullptr : found->get();
 }
 
@@ -45,19 +47,19 @@ Http::Response DicomWebService::answer(const Http::Request& request)
     ResourcePath path;
     if (!ResourcePath::parse(request.path.mid(mPrefixSegments), path))
         return Http::failure(404, QStringLiteral("No resource has this path"));
-    Resource* const receiving = receiver(path);
+    Resource* const receiving = find(&Resource::receives, path);
+    Resource* const removing = find(&Resource::removes, path);
     if (request.method == Http::Method::Post && receiving != nullptr)
         return receiving->receive(below(request), path);
-    for (const std::unique_ptr<Resource>& resource : mResources) {
-        if (!resource->owns(path))
-            continue;
-        if (request.method == Http::Method::Options)
-            return methodsOnly(204, receiving != nullptr);
-        if (request.method != Http::Method::Get && request.method != Http::Method::Head)
-            return methodsOnly(405, receiving != nullptr);
-        return resource->answer(below(request), path);
-    }
-    return Http::failure(404, QStringLiteral("No resource has this path"));
+    if (request.method == Http::Method::Delete && removing != nullptr)
+        return removing->remove(below(request), path);
+    Resource* const owner = find(&Resource::owns, path);
+    if (owner == nullptr)
+        return Http::failure(404, QStringLiteral("No resource has this path"));
+    if (request.method == Http::Method::Get || request.method == Http::Method::Head)
+        return owner->answer(below(request), path);
+    return methodsOnly(request.method == Http::Method::Options ? 204 : 405, receiving != nullptr,
+                       removing != nullptr);
 }
 
 }  // namespace Kdd::DicomWeb

@@ -27,6 +27,15 @@ public:
     {
         return Http::Response(405);
     }
+
+    /// Whether what the path names can be removed.
+    virtual bool removes(const ResourcePath& /*path*/) const { return false; }
+
+    /// The answer to DELETE on such a path, once it is done.
+    virtual Http::Response remove(const Http::Request& /*request*/, const ResourcePath& /*path*/)
+    {
+        return Http::Response(405);
+    }
 };
 
 }  // namespace Kdd::DicomWeb

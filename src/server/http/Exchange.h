@@ -1,6 +1,6 @@
 #pragma once
 
-#include "server/http/Request.h"
+#include "server/http/Response.h"
 
 #include <QString>
 
@@ -12,8 +12,9 @@ namespace Kdd::Http
 /// A request and what became of it.
 struct Exchange
 {
-    Request request;    ///< of one that could not be read only what is known
-    QByteArray caller;  ///< who asked; empty where nobody knows
+    Request request;               ///< of one that could not be read only what is known
+    QByteArray caller;             ///< who asked; empty where nobody knows
+    std::optional<Effect> effect;  ///< what the request changed, where that is said
     int status = 0;
     qint64 bytes = 0;                      ///< sent, with the header
     std::chrono::microseconds duration{};  ///< from the whole request to the last byte handed to the system

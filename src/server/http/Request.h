@@ -33,6 +33,11 @@ struct Request
         certificate;  ///< whom the certificate that the peer showed names, "CN=...,O=..."; empty: none was
     QByteArray id;    ///< of this request, in logs and in the answer's X-Request-Id
 
+    // As those know who let it in:
+
+    QByteArray caller;           ///< who sends it; empty: nobody in particular
+    QVector<QByteArray> rights;  ///< what he may: "read", "store", "correct", "delete"
+
     /// The value of a header, named in small letters; of one sent several times the values joined by ", ". Null when
     /// it was not sent.
     QByteArray header(const char* name) const;

@@ -6,6 +6,7 @@
 #include <kddlib/Result.h>
 
 #include <memory>
+#include <optional>
 #include <variant>
 #include <vector>
 
@@ -41,6 +42,13 @@ public:
     virtual Response answer() = 0;
 };
 
+/// What a request changed, for those who keep trails: which studies, and how much of them. Never values.
+struct Effect
+{
+    QVector<QByteArray> studies;
+    int images = 0;
+};
+
 /// What an answer consists of, in this order. Its length is known unless there is a producer, and is then sent.
 using BodyPart = std::variant<QByteArray, FileRange, std::unique_ptr<Producer>>;
 
@@ -50,6 +58,7 @@ struct Response
     QVector<Field> headers;  ///< Content-Length, Transfer-Encoding, Connection and Date come from the session
     std::vector<BodyPart> body;
     QByteArray caller;  ///< who asked, for those who are told of the exchange; empty where nobody knows
+    std::optional<Effect> effect;  ///< for the same; null: nothing was changed, or nobody says
 
     /// Of a request whose body decides: takes the body and gives the answer, to which `headers` are added. POST is answered
     /// before its body is read, so that who may not send it need not; without a sink a small body is let go.

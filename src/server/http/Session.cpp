@@ -258,6 +258,7 @@ void Session::write(Response response)
     form.isOldVersion = mReader.isOldVersion();
     form.keepsConnection = mReader.keepsConnection() && !mIsRefused && !mHost.stops;
     form.id = mRequest.id;
+    mEffect = response.effect;
     mWriter.emplace(std::move(response), form);
     send();
 }
@@ -317,8 +318,8 @@ void Session::report(bool isWhole)
 {
     --mHost.inFlight;
     const auto duration = std::chrono::duration_cast<std::chrono::microseconds>(Clock::now() - mBegan);
-    mHost.observer.ended(
-        {mRequest, mCaller, mWriter->status(), mWriter->bytesSent(), duration, isWhole, mWriter->fault()});
+    mHost.observer.ended({mRequest, mCaller, mEffect, mWriter->status(), mWriter->bytesSent(), duration,
+                          isWhole, mWriter->fault()});
     mWriter.reset();
     mRequest = {};
 }
@@ -329,7 +330,7 @@ void Session::reportBrokenOff()
     mSink.reset();
     --mHost.inFlight;
     const auto duration = std::chrono::duration_cast<std::chrono::microseconds>(Clock::now() - mBegan);
-    mHost.observer.ended({mRequest, mCaller, 400, 0, duration, false, {}});
+    mHost.observer.ended({mRequest, mCaller, {}, 400, 0, duration, false, {}});
     mRequest = {};
 }
 

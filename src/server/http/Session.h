@@ -91,7 +91,8 @@ private:
     RequestReader mReader;
     Request mRequest;
     QByteArray mPeer;
-    QByteArray mCaller;  // of the request that is answered
+    QByteArray mCaller;             // of the request that is answered
+    std::optional<Effect> mEffect;  // of that
     std::optional<ResponseWriter> mWriter;
     std::unique_ptr<BodySink> mSink;  // while a body is received
     QVector<Field> mHeaders;          // of the answer that it gives

@@ -38,6 +38,8 @@ struct ServeRequest
     QByteArray publicAddress;
     QList<QByteArray> hosts;
     bool stow = false;
+    bool corrections = false;
+    bool deletions = false;
 };
 
 /// Whether the process would go with a terminal that is closed. nohup has that signal ignored.
@@ -182,6 +184,8 @@ bool readSettings(const GlobalOptions& options, const ServeRequest& request, Ser
     settings.addresses.publicAddress = orElse(request.publicAddress, ExResource::serverPublicAddress());
     settings.addresses.hosts = wordsOf(ExResource::serverHosts()) + request.hosts.toVector();
     settings.addresses.proxies = wordsOf(ExResource::serverProxies());
+    settings.changes.corrections = request.corrections || ExResource::serverTakesCorrections();
+    settings.changes.deletions = request.deletions || ExResource::serverDeletes();
     return !(request.stow || ExResource::serverTakesObjects()) || readObjectRules(options, settings);
 }
 
@@ -273,6 +277,9 @@ void declareServe(CommandSet& commands)
     arguments.text({"--public", kUrl, "Address under which clients reach the server"},
                    request->publicAddress);
     arguments.flag("--stow", request->stow, "Take objects that clients send (STOW-RS)");
+    arguments.flag("--corrections", request->corrections,
+                   "Take corrections of what is stored, and moves between studies");
+    arguments.flag("--deletions", request->deletions, "Delete studies, series and images when asked to");
     arguments.texts({"--host", "NAME", "Further name by which the server may be asked; may be repeated"},
                     request->hosts);
 }

@@ -202,6 +202,33 @@ TEST_F(AccessGateTest, LetsNoPageOfOtherOriginsChangeAnything)
     for (const char* origin :
          {"https://evil.example", "null", "", "http://pacs.example", "https://pacs.example:8443"})
         EXPECT_EQ(status({{"origin", origin}}), 403) << origin;
+    for (const char* site : {"same-origin", "none"})
+        EXPECT_EQ(status({{"sec-fetch-site", site}}), 200) << site;
+    for (const char* site : {"cross-site", "same-site", ""})
+        EXPECT_EQ(status({{"sec-fetch-site", site}}), 403) << site;
+    EXPECT_EQ(status({{"sec-fetch-site", "cross-site"}, {"origin", "https://viewer.example"}}), 200);
+    EXPECT_EQ(status(), 200) << "no browser";
+}
+
+TEST_F(AccessGateTest, TellsThoseInsideWhoAsksAndWhatHeMay)
+{
+    useHeader();
+    mRules.anyone = Right::Correct;
+    class : public Http::Handler
+    {
+    public:
+        Http::Response answer(const Http::Request& request) override
+        {
+            QByteArray told = request.caller;
+            for (const QByteArray& right : request.rights)
+                told += ' ' + right;
+            return Http::textResponse(200, "text/plain", told);
+        }
+    } inside;
+    mRequest.headers = {{"x-user", "anna"}};
+    mRequest.method = Http::Method::Post;
+    const Http::Response told = AccessGate(mRules, RightsTable({"dicom-web"}), {}, inside).answer(mRequest);
+    EXPECT_EQ(std::get<QByteArray>(told.body.at(0)), "anna read store correct");
 }
 
 TEST_F(AccessGateTest, TellsWhatIsWrongWithATokenAndNothingOfIt)

@@ -175,6 +175,69 @@ async function walkHostile() {
   await until('words for a study that is not there', () => document.querySelector('.state')?.textContent.includes('no such study'));
 }
 
+async function fill(selector, words) {
+  await page.$eval(selector, (field) => { field.focus(); field.select(); });
+  await page.keyboard.type(words);
+}
+
+/** Corrects a series behind a preview, by keyboard; a value is markup again. */
+async function walkCorrect() {
+  await openStudy('name=ller&modality=CT');
+  const study = await address();
+  await page.$eval('.tabs a[href$=correct]', (link) => link.focus());
+  await page.keyboard.press('Enter');
+  await present('.correcting');
+  await page.select('.correcting select', '00100020');
+  await fill('.correcting input[aria-label="New value"]', '<b>8</b>');
+  await fill('#login', 'berta');
+  await page.keyboard.press('Enter');
+  await present('.preview .correction');
+  check(await focused('.preview'), 'the preview does not get the focus');
+  check((await text('.preview ins')) === '<b>8</b>', 'the new value is not shown as text');
+  check(await page.$eval('.preview del', (old) => old.textContent !== '<b>8</b>'), 'the old value is not shown');
+  await shoot('correct');
+  await fill('.correcting input[aria-label="New value"]', 'x'.repeat(65));
+  check(await all('.preview .correction') === 0, 'a preview stays although something else would be done');
+  await page.select('.correcting select', '00100030');
+  await page.keyboard.press('Enter');
+  await present('.refusal');
+  check((await text('.refusal')).includes('is no date'), 'it is not told why a correction is refused');
+  await page.select('.correcting select', '00100020');
+  await fill('.correcting input[aria-label="New value"]', '<b>9</b>');
+  await page.keyboard.press('Enter');
+  await present('.preview .button.main');
+  await page.$eval('.preview .button.main', (button) => button.focus());
+  await page.keyboard.press('Enter');
+  await until('word of what was corrected', () => document.querySelector('.preview h2')?.textContent === 'Corrected');
+  await page.goto(`${root}/${study}/corrections`);
+  await present('.correction');
+  check((await text('.correction header')).includes('berta'), 'it is not told who corrected');
+  check(await all('.exports a[download]') === 2, 'the history cannot be taken along');
+  check((await text('.correction ins')) === '<b>9</b>' && await all('main b b, .value b') === 0, 'markup of a value came alive');
+  return study;
+}
+
+/** Deletes an image and then the study, but nothing before the words are typed. */
+async function walkDelete(study) {
+  await page.goto(`${root}/${study}/delete`);
+  await present('#typed');
+  const count = Number((await text('.change-form label b')).split(' ')[1]);
+  await fill('#typed', `delete ${count + 1}`);
+  check(await page.$eval('.button.danger', (button) => button.disabled), 'what is not confirmed can be deleted');
+  await page.keyboard.press('Enter');
+  await shoot('delete');
+  check(await all('.preview h2') === 0, 'something was deleted that was not confirmed');
+  await page.select('#choice', '1');
+  const part = Number((await text('.change-form label b')).split(' ')[1]);
+  check(part > 0 && part < count, 'a series is not named by its images');
+  await fill('#typed', `delete ${part}`);
+  await page.keyboard.press('Enter');
+  await until('word of what was deleted', () => document.querySelector('.preview h2')?.textContent === 'Deleted');
+  check((await text('.preview p')).startsWith(`${part} image`), 'it is not told how much is gone');
+  await page.goto(`${root}/${study}`);
+  await present('.series');
+}
+
 async function walkOffline() {
   await page.goto(`${root}/#/`);
   await present('.study');
@@ -190,7 +253,7 @@ async function walkOffline() {
 /** What Chromium says of an answer that the walk expects to fail is no fault of the page. */
 function isExpected(fault) {
   return fault.startsWith('console: Failed to load resource') &&
-    (fault.includes('/browser/studies/1.2.3.4.5.6.7.8.9') || fault.includes('ERR_INTERNET_DISCONNECTED'));
+    (fault.includes('/browser/studies/1.2.3.4.5.6.7.8.9') || fault.includes('/corrections?preview=true') || fault.includes('ERR_INTERNET_DISCONNECTED'));
 }
 
 try {
@@ -199,6 +262,7 @@ try {
   await walkImage();
   await walkSides();
   await walkHostile();
+  await walkDelete(await walkCorrect());
   await walkOffline();
 } catch (error) {
   faults.push(String(error));

@@ -41,7 +41,7 @@ XML
 "$kdd" --quiet qa "$folder/job.xml" --study "$study" --image "$image"
 
 mkfifo "$folder/said"
-"$kdd" serve --listen 127.0.0.1:0 >"$folder/said" &
+"$kdd" serve --corrections --deletions --listen 127.0.0.1:0 >"$folder/said" &
 server=$!
 read -r said <"$folder/said"
 node "$here/page.mjs" "${said##* }" "$pictures"

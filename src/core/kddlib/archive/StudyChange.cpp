@@ -7,6 +7,7 @@
 #include "kddlib/tagfile/qa/QAData.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
+#include "platform/base/Stopwatch.h"
 #include "platform/os/FileStatus.h"
 
 #include <algorithm>
@@ -17,15 +18,14 @@ namespace Kdd
 namespace
 {
 
-/// Each waits 0.4 seconds, so it goes on for two minutes.
-constexpr int kAttempts = 300;
-
-bool isListed(const ArchiveNode& node, const Kxg::StudyContents& contents)
+/// How many images of the node are listed.
+int countListed(const ArchiveNode& node, const Kxg::StudyContents& contents)
 {
-    return std::any_of(contents.images.begin(), contents.images.end(), [&](const Kxg::ListedImage& listed) {
+    const auto isListed = [&](const Kxg::ListedImage& listed) {
         return (node.series.isEmpty() || listed.seriesInstanceUID == node.series) &&
                (node.image.isEmpty() || listed.key() == node.image);
-    });
+    };
+    return static_cast<int>(std::count_if(contents.images.begin(), contents.images.end(), isListed));
 }
 
 bool isHeld(const ArchiveNode& node, const TagFile& file)
@@ -51,15 +51,21 @@ void takeOut(const ArchiveNode& node, TagFile& file)
 }
 
 /// Says what there is not, by the innermost of the names that were given.
-Result absent(const ArchiveNode& node)
+Removal absent(const ArchiveNode& node)
 {
     const QString study = QString::fromUtf8(node.study);
-    if (node.series.isEmpty() && node.image.isEmpty())
-        return Result::failure(QStringLiteral("There is no study %1").arg(study));
     const bool isSeries = node.image.isEmpty();
-    return Result::failure(QStringLiteral("Study %1 has no %2 %3")
-                               .arg(study, isSeries ? QStringLiteral("series") : QStringLiteral("image"),
-                                    QString::fromUtf8(isSeries ? node.series : node.image)));
+    QString reason = QStringLiteral("There is no study %1").arg(study);
+    if (!node.series.isEmpty() || !node.image.isEmpty())
+        reason = QStringLiteral("Study %1 has no %2 %3")
+                     .arg(study, isSeries ? QStringLiteral("series") : QStringLiteral("image"),
+                          QString::fromUtf8(isSeries ? node.series : node.image));
+    return {Removal::Fault::Absent, Result::failure(reason), 0};
+}
+
+Removal failed(const Result& result)
+{
+    return {result.good() ? Removal::Fault::None : Removal::Fault::Failed, result, 0};
 }
 
 Result unchanged(const QByteArray& studyUID, const TagFile& file)
@@ -69,54 +75,81 @@ Result unchanged(const QByteArray& studyUID, const TagFile& file)
 }
 
 /// From a tag file that the catalogue does not know.
-Result removeUnregistered(const ArchiveNode& node)
+Removal removeUnregistered(const ArchiveNode& node)
 {
     TagFile file;
     if (presenceOf(TagFile::cacheFilePathForStudy(node.study.constData())) == FilePresence::Absent)
         return absent(node);
-    if (!file.readWhenFreeForStudy(node.study.constData(), true))
-        return unchanged(node.study, file);
+    if (!file.readWhenFreeForStudy(node.study.constData(), true)) {
+        const auto fault = file.wasLockedOut() ? Removal::Fault::LockedOut : Removal::Fault::Failed;
+        return {fault, unchanged(node.study, file), 0};
+    }
     if (!isHeld(node, file))
         return absent(node);
+    const int before = file.imagesByUID().size();
     takeOut(node, file);
-    return file.writeCacheFile() ? Result() : unchanged(node.study, file);
+    const int left = file.imagesByUID().size();
+    if (!file.writeCacheFile())
+        return failed(unchanged(node.study, file));
+    return {Removal::Fault::None, {}, before - left};
+}
+
+/// Each attempt waits some 0.4 seconds for others.
+Result tryFor(int patienceMs, bool (*attempt)(QAData&, QString&), QAData& job)
+{
+    const Stopwatch waiting;
+    QString reason;
+    bool isDone = attempt(job, reason);
+    while (!isDone && job.outcome.isLockedOut && waiting.elapsed() < patienceMs)
+        isDone = attempt(job, reason);
+    return isDone ? Result() : Result::failure(reason);
 }
 
 }  // namespace
 
-Result StudyChange::remove(const ArchiveNode& node)
+Removal StudyChange::remove(const ArchiveNode& node, int patienceMs)
 {
     QVector<QByteArray> registered;
     // One is enough: before all UIDs that it begins comes the UID itself.
-    Result found = mCatalogue.findStudies(node.study, 1, registered);
+    const Result found = mCatalogue.findStudies(node.study, 1, registered);
     if (found.bad())
-        return found;
-    return registered.contains(node.study) ? removeRegistered(node) : removeUnregistered(node);
+        return failed(found);
+    return registered.contains(node.study) ? removeRegistered(node, patienceMs) : removeUnregistered(node);
 }
 
-Result StudyChange::removeRegistered(const ArchiveNode& node)
+Removal StudyChange::removeRegistered(const ArchiveNode& node, int patienceMs)
 {
     std::unique_ptr<Kxg::StudyClaim> claim;
     Kxg::StudyContents contents;
-    Result result = claimStudy(mCatalogue, node.study, claim);
+    Result result = mCatalogue.claim(node.study, patienceMs, claim);
+    if (result.good() && claim == nullptr)
+        return {Removal::Fault::LockedOut,
+                Result::failure(QStringLiteral("Study %1 is being worked on by another process")
+                                    .arg(QString::fromUtf8(node.study))),
+                0};
     if (result.good())
         result = mCatalogue.studyContents(node.study, contents);
     if (result.bad())
-        return result;
+        return failed(result);
+    // Others may have removed it while this waited for them.
+    if (contents.id == 0)
+        return removeUnregistered(node);
     // What a removal that died has left in the tag file goes with its repeat.
     TagFile present;
     const bool isWholeStudy = node.series.isEmpty() && node.image.isEmpty();
-    if (!isWholeStudy && !isListed(node, contents) &&
+    const int images = countListed(node, contents);
+    if (!isWholeStudy && images == 0 &&
         !(present.readWhenFreeForStudy(node.study.constData(), false) && isHeld(node, present)))
         return absent(node);
     // The database first: whatever dies from here on leaves a study that waits to be completed.
     result = forget(node);
     if (result.bad())
-        return result;
+        return failed(result);
     StudyCompletion completion(mCatalogue);
     // What had changed before this removal is not in the tag file yet,
     // so taking images out of that would not do.
-    return (contents.changes.isEmpty() ? completion.reduce(*claim) : completion.build(*claim)).result;
+    result = (contents.changes.isEmpty() ? completion.reduce(*claim) : completion.build(*claim)).result;
+    return {result.good() ? Removal::Fault::None : Removal::Fault::Failed, result, images};
 }
 
 Result StudyChange::forget(const ArchiveNode& node)
@@ -128,13 +161,14 @@ Result StudyChange::forget(const ArchiveNode& node)
     return mCatalogue.removeStudy(node.study);
 }
 
-Result StudyChange::correct(QAData& job)
+Result StudyChange::correct(QAData& job, int patienceMs)
 {
-    QString reason;
-    bool isDone = TagFile::applyQA(job, reason);
-    for (int i = 1; i < kAttempts && !isDone && job.outcome.isLockedOut; ++i)
-        isDone = TagFile::applyQA(job, reason);
-    return isDone ? Result() : Result::failure(reason);
+    return tryFor(patienceMs, TagFile::applyQA, job);
+}
+
+Result StudyChange::preview(QAData& job, int patienceMs)
+{
+    return tryFor(patienceMs, TagFile::previewQA, job);
 }
 
 Result StudyChange::synchronise(const QByteArray& studyUID, TagFile& file)

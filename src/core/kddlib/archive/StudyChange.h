@@ -20,6 +20,21 @@ struct ArchiveNode
     QByteArray image;   ///< SOP Instance UID, the path of an image without one, or empty
 };
 
+/// What became of a removal.
+struct Removal
+{
+    enum class Fault {
+        None,
+        Absent,     ///< there is no such node
+        LockedOut,  ///< others work on the study all the time: try again
+        Failed,     ///< it is not removed whole; a repeat completes it
+    };
+
+    Fault fault = Fault::None;
+    Result result;
+    int images = 0;  ///< that are gone
+};
+
 /// Changes of what the archive holds: removals, corrections, bringing a tag file into line with the database. Each waits
 /// for whoever works on the study, and goes through to its end under one claim. Used by the thread of its catalogue.
 class KDD_EXPORT StudyChange
@@ -34,17 +49,27 @@ public:
     /// Removes a node for good; its files stay where they are, and come back only when they are taken in again. The
     /// catalogue forgets it first, so that a process that dies in between leaves a study that waits to be completed, and
     /// a repeat completes it. Failure: there is no such node, or it is not removed.
-    Result remove(const ArchiveNode& node);
+    Result remove(const ArchiveNode& node) { return remove(node, kRemovalPatience).result; }
 
-    /// Applies a correction, trying again for some minutes while others hold the tag files.
-    static Result correct(QAData& job);
+    /// The same for whoever waits only so long [ms] for others that work on the study.
+    Removal remove(const ArchiveNode& node, int patienceMs);
+
+    /// Applies a correction, trying again for so long [ms] while others work on the studies or hold the tag files.
+    static Result correct(QAData& job, int patienceMs = kCorrectionPatience);
+
+    /// Tells in the job's outcome what correcting would do now, and fails as that would. Nothing is changed.
+    static Result preview(QAData& job, int patienceMs = kCorrectionPatience);
 
     /// Brings the tag file into line with the database without opening files: paths, names of volumes, what is not
     /// listed any more. `file` holds the study afterwards. Failure: it cannot be read or written.
     Result synchronise(const QByteArray& studyUID, TagFile& file);
 
 private:
-    Result removeRegistered(const ArchiveNode& node);
+    // The largest studies take some minutes to be built [ms].
+    static constexpr int kRemovalPatience = 10 * 60 * 1000;
+    static constexpr int kCorrectionPatience = 2 * 60 * 1000;
+
+    Removal removeRegistered(const ArchiveNode& node, int patienceMs);
     Result forget(const ArchiveNode& node);
 
     Kxg::Catalogue& mCatalogue;

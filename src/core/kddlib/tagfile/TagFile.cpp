@@ -338,7 +338,14 @@ int TagFile::exportPreviews(const QString& folder) const
 
 bool TagFile::applyQA(QAData& job, QString& message)
 {
-    const Result result = QAJob(job).run();
+    const Result result = QAJob(job, QAJob::Purpose::Apply).run();
+    message = result.text();
+    return result.good();
+}
+
+bool TagFile::previewQA(QAData& job, QString& message)
+{
+    const Result result = QAJob(job, QAJob::Purpose::Preview).run();
     message = result.text();
     return result.good();
 }

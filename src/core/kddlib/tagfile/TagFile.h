@@ -219,6 +219,10 @@ public:
     /// an edit.
     static bool applyQA(QAData& job, QString& message);
 
+    /// Tells in the job's outcome what `applyQA` would do now, and why it would refuse, by doing all of it but for keeping
+    /// it: no file, claim or record is touched.
+    static bool previewQA(QAData& job, QString& message);
+
     /// Gives back the volumes that were taken out of a series before its images changed: each part of a volume to the
     /// series that now holds its images. A volume that stays whole keeps all it says; one that is divided has only its
     /// images and slices in common with the volume file, so its parts are bare.

@@ -11,7 +11,7 @@ export class Failure extends Error {
 const kinds = { 404: 'absent', 410: 'absent', 503: 'busy' };
 const longestReason = 300;
 
-async function reasonOf(response) {
+export async function reasonOf(response) {
   const type = response.headers.get('Content-Type') ?? '';
   if (!type.startsWith('text/plain')) return `The server answered ${response.status}.`;
   const text = await response.text();
@@ -36,7 +36,7 @@ async function ask(address, accept, signal) {
   }
 }
 
-export const config = { dicomWeb: 'dicom-web', viewer: false, thumbnails: false };
+export const config = { dicomWeb: 'dicom-web', viewer: false, thumbnails: false, may: [], caller: '' };
 
 export async function readConfig(signal) {
   Object.assign(config, await ask('browser/config', 'application/json', signal));

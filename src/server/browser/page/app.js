@@ -3,6 +3,7 @@
 //   #/?name=doe&modality=CT                 studies that fit
 //   #/studies/1.2                           a study
 //   #/studies/1.2/volumes, /corrections
+//   #/studies/1.2/correct, /delete          for those who may
 //   #/studies/1.2/images/1.4                an image
 //   #/studies/1.2/difference?a=1.4&b=1.5
 
@@ -10,9 +11,11 @@ import { config, Failure, readConfig } from './api.js';
 import { h, state } from './dom.js';
 import { isTyping } from './keys.js';
 import { listView } from './list.js';
+import { correctView } from './correct.js';
 import { correctionsView } from './corrections.js';
 import { differenceView } from './difference.js';
 import { imageView } from './image.js';
+import { removeView } from './remove.js';
 import { studyView } from './study.js';
 import { volumesView } from './volumes.js';
 
@@ -21,6 +24,8 @@ const views = [
   [/^\/studies\/([^/]+)$/, studyView],
   [/^\/studies\/([^/]+)\/volumes$/, volumesView],
   [/^\/studies\/([^/]+)\/corrections$/, correctionsView],
+  [/^\/studies\/([^/]+)\/correct$/, correctView],
+  [/^\/studies\/([^/]+)\/delete$/, removeView],
   [/^\/studies\/([^/]+)\/images\/([^/]+)$/, imageView],
   [/^\/studies\/([^/]+)\/difference$/, differenceView],
 ];

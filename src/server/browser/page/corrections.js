@@ -1,7 +1,8 @@
 // What was corrected in a study, as the audit logs of its images tell it.
 
 import { getCorrections } from './api.js';
-import { h, state } from './dom.js';
+import { correctionsAddress } from './change-api.js';
+import { h, icon, state } from './dom.js';
 import { amount, logTime, spaced, tagText } from './format.js';
 import { hints } from './keys.js';
 import { imageLink, loadStudy, studyHead, studyLink } from './study.js';
@@ -29,11 +30,19 @@ function panel(study, correction) {
         count > images.length && h('li', {}, `and ${count - images.length} more`))));
 }
 
+function exports(study) {
+  const address = correctionsAddress(study);
+  return h('div', { class: 'exports' },
+    h('a', { class: 'button', href: `${address}?accept=text/csv`, download: `corrections-${study}.csv` }, icon('save'), 'CSV'),
+    h('a', { class: 'button', href: `${address}?accept=application/json`, download: `corrections-${study}.json` }, icon('braces'), 'JSON'));
+}
+
 export async function correctionsView(view, query, uid) {
   const [study, found] = await Promise.all([loadStudy(view, uid), getCorrections(uid, view.signal)]);
   const { corrections, complete, unreadable } = found;
   view.replace(...studyHead(study, '/corrections'),
     unreadable > 0 && h('p', { class: 'note' }, `The audit log of ${amount(unreadable, 'image')} cannot be read.`),
+    (corrections.length > 0 || unreadable > 0) && exports(uid),
     corrections.length > 0 ? corrections.map((one) => panel(uid, one))
       : state('none', 'Nothing was corrected', 'All images show what their DICOM files say.'),
     !complete && h('p', { class: 'note' }, 'There are more corrections than are shown here.'),

@@ -1,6 +1,7 @@
 // An image: its picture, its neighbours, and every attribute with the node of the tree that holds it.
 
 import { addresses, getAttributes, getStudy } from './api.js';
+import { isNamed, may } from './change-api.js';
 import { announce, h, icon, picture, waiting } from './dom.js';
 import { amount, date } from './format.js';
 import { hints } from './keys.js';
@@ -27,7 +28,9 @@ function aside(study, series, image) {
       image.image.frames > 1 && [h('dt', {}, 'Frames'), h('dd', {}, image.image.frames)]),
     h('p', { class: 'soft' }, `The study holds ${amount(image.own.study, 'value')}, the series ${image.own.series} and the image ${image.own.image}.`),
     other && h('a', { class: 'button', href: studyLink(uid, `/difference?a=${encodeURIComponent(image.key)}&b=${encodeURIComponent(other)}`) },
-      icon('compare'), 'Compare with another'));
+      icon('compare'), 'Compare with another'),
+    isNamed(image.key) && [['correct', 'Correct'], ['delete', 'Delete']].filter(([right]) => may(right)).map(([right, name]) =>
+      h('a', { class: 'button', href: studyLink(uid, `/${right}?image=${encodeURIComponent(image.key)}`) }, `${name} this image`)));
 }
 
 export async function imageView(view, query, uid, key) {

@@ -54,6 +54,8 @@ export function tabs(study, current) {
   const volumes = study.series.reduce((sum, series) => sum + series.volumes.length, 0);
   const entries = [['', 'Series', study.series.length], ['/volumes', 'Volumes', volumes],
     ['/difference', 'Differences', null], ['/corrections', 'Corrections', study.corrected ? null : 0]];
+  if (config.may.includes('correct')) entries.push(['/correct', 'Correct', null]);
+  if (config.may.includes('delete')) entries.push(['/delete', 'Delete', null]);
   return h('nav', { class: 'tabs', 'aria-label': 'Sides of the study' }, entries.map(([rest, name, count]) =>
     h('a', { href: studyLink(study.study, rest), 'aria-current': rest === current ? 'page' : null }, name,
       count !== null && h('span', { class: 'count' }, count))));

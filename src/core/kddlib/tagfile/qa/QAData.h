@@ -1,5 +1,6 @@
 #pragma once
 
+#include "kddlib/tagfile/qa/QAAudit.h"
 #include "platform/base/Export.h"
 
 #include <QByteArray>
@@ -22,6 +23,13 @@ struct QASubstitution
     QString value;
 };
 
+/// What a correction changed of one image.
+struct QAImageOutcome
+{
+    QByteArray image;              ///< under which it was known before
+    QVector<AuditChange> changes;  ///< in the order of the job
+};
+
 /// A correction of stored images, to be applied by `TagFile::applyQA`: an edit of a study, or with an old study a move
 /// of images from there into the study.
 ///
@@ -34,15 +42,21 @@ struct KDD_EXPORT QAData
     QByteArray timestamp;            ///< "yyyyMMddhhmmss" as the job has it, or blank for now
     QByteArray login;                ///< who corrects, one line of Latin-1; may be empty
     QList<QByteArray> images;        ///< SOP Instance UIDs
+    QList<QByteArray> series;        ///< Series Instance UIDs, all images of which are meant too
+    bool isOfWholeStudy = false;     ///< all images of the study, of a move of the old one, are meant
     QList<QByteArray> cacheEntries;  ///< names of file-cache entries, for the caller's use
 
-    /// What `applyQA` did.
+    /// What `applyQA` did, or would do.
     struct Outcome
     {
+        int asked = 0;               ///< images that the job means
         int changed = 0;             ///< images with a new entry in their audit log
         int moved = 0;               ///< images that are now in another study, series or under another UID
-        QList<QByteArray> notFound;  ///< images that no study concerned holds
-        bool isLockedOut = false;    ///< it failed because others held a study all the time: try again
+        QList<QByteArray> notFound;  ///< images and series that no study concerned holds
+        QVector<QAImageOutcome> images;  ///< those that are changed
+        bool isLockedOut = false;        ///< it failed because others held a study all the time: try again
+        bool isRefused = false;   ///< it failed because of what it asks of these images: it would again
+        QByteArray refusedImage;  ///< the image that the reason names; empty: none
     };
 
     Outcome outcome;

@@ -9,6 +9,7 @@
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
 #include "platform/base/Stopwatch.h"
+#include "platform/os/FileStatus.h"
 
 #include <dcmtk/dcmdata/dcdeftag.h>
 
@@ -76,27 +77,29 @@ Result QAJob::run()
     const Stopwatch total;
     Result result = prepare();
     if (result.good())
-        result = claim();
-    if (result.good())
-        result = hold();
+        result = open();
     if (result.bad())
         return result;
     const int readMs = total.elapsed();
     mSourceHasLabels = hasLabels(mSource.tree());
     // A study that the move makes follows the one that its images come from.
     mDestinationHasLabels = hasLabels(mDestination.tree().isEmpty() ? mSource.tree() : mDestination.tree());
+    selectImages();
     result = applyToImages();
+    mJob.outcome.isRefused = result.bad();
     const Stopwatch writing;
     if (result.good() && (mJob.outcome.changed > 0 || mJob.outcome.moved > 0))
-        result = write();
+        result = mIsPreview ? recorded(mRecord.plan()) : write();
     if (result.bad())
+        return result;
+    if (mIsPreview)
         return result;
     const int optimiseMs = mDestination.figures().optimiseMs;
     if (TagFileSettings::debugOption(TagFileSettings::kTimings)) {
         LogFile::tracef(
             1, kCategory, "%s: Total=%d Read=%d Optimize=%d Write=%d (%d images, %d changed, %d not found)",
             mIsMove ? "Move" : "Edit", total.elapsed(), readMs, optimiseMs, writing.elapsed() - optimiseMs,
-            mJob.images.size(), mJob.outcome.changed, mJob.outcome.notFound.size());
+            mImages.size(), mJob.outcome.changed, mJob.outcome.notFound.size());
     }
     return {};
 }
@@ -109,6 +112,7 @@ Result QAJob::prepare()
         mJob.oldStudyUID.clear();
     mIsMove = !mJob.oldStudyUID.isEmpty();
     Result result = check(mJob);
+    mJob.outcome.isRefused = result.bad();
     if (result.bad())
         return result;
     auditTime(mJob.timestamp, mTime);
@@ -124,12 +128,32 @@ Result QAJob::prepare()
 
 // ---- holding the studies
 
-/// Whoever builds a study claims it first and holds its file then.
-Result QAJob::claim()
+/// Whoever builds a study claims it first and holds its file then. Who only looks leaves both to others.
+Result QAJob::open()
 {
-    Result result = mRecord.claim(mJob);
+    Result result = mIsPreview ? mRecord.consult(mJob) : mRecord.claim(mJob);
     mJob.outcome.isLockedOut = mRecord.wasLockedOut();
+    if (result.good() && !mIsPreview)
+        return hold();
+    if (result.good())
+        result = look(mDestination, mJob.studyUID);
+    if (result.good() && mIsMove)
+        result = look(mSource, mJob.oldStudyUID);
     return result;
+}
+
+/// A study without file has no images.
+Result QAJob::look(StoredStudy& study, const QByteArray& studyUID)
+{
+    const QString path = TagFileSettings::cacheFilePathForStudy(studyUID.constData());
+    if (presenceOf(path) == FilePresence::Absent)
+        return {};
+    const Result read = study.read(path, studyUID.constData(), false, StoredStudy::Reader::Serving);
+    if (read.good() || presenceOf(path) == FilePresence::Absent)
+        return {};
+    mJob.outcome.isLockedOut = study.wasLockedOut();
+    return read.within(
+        QStringLiteral("The tag file of study %1 cannot be read").arg(QString::fromLatin1(studyUID)));
 }
 
 /// All hold the files in the same order: two that each have what the other waits for would both give up.
@@ -185,10 +209,12 @@ void QAJob::tidy()
     mDestination.optimizeAll();
 }
 
-Result QAJob::record()
+/// What became of keeping the changes.
+Result QAJob::recorded(const Result& result)
 {
-    Result result = mRecord.record();
     mJob.outcome.isLockedOut = mRecord.wasLockedOut();
+    mJob.outcome.refusedImage = mRecord.refusedImage();
+    mJob.outcome.isRefused = !mRecord.refusedImage().isEmpty();
     return result;
 }
 
@@ -197,7 +223,7 @@ Result QAJob::record()
 Result QAJob::write()
 {
     tidy();
-    Result result = record();
+    Result result = recorded(mRecord.record());
     if (result.bad())
         return result;
     if (!mDestination.tree().isEmpty())

@@ -20,9 +20,15 @@ bool movesImages(const DcmTagKey& key);
 class QAJob
 {
 public:
-    /// The job must outlive the object. What the run did is told in its outcome.
-    explicit QAJob(QAData& job)
+    enum class Purpose {
+        Apply,
+        Preview,  ///< only the outcome is wanted: nothing is claimed, made or written
+    };
+
+    /// The job must outlive the object. What the run did, or would do, is told in its outcome.
+    QAJob(QAData& job, Purpose purpose)
         : mJob(job)
+        , mIsPreview(purpose == Purpose::Preview)
     {
     }
 
@@ -54,9 +60,12 @@ private:
     using Series = std::pair<StudyTree*, QByteArray>;
 
     Result prepare();
+    Result open();
     Result hold();
     Result hold(StoredStudy& study, const QByteArray& studyUID, IfAbsent ifAbsent);
+    Result look(StoredStudy& study, const QByteArray& studyUID);
 
+    void selectImages();
     Result applyToImages();
     Result applyTo(const QByteArray& key);
     Result applyTo(TagMap& image, const QByteArray& key);
@@ -75,14 +84,15 @@ private:
 
     void tidy();
     Result claim();
-    Result record();
+    Result recorded(const Result& result);
     Result write();
     Result writeSource();
     Result failWriting(const QString& reason);
     bool takeBack();
 
-    static Result failAt(const QByteArray& key, const QString& reason)
+    Result failAt(const QByteArray& key, const QString& reason)
     {
+        mJob.outcome.refusedImage = key;
         return Result::failure(reason).within(QStringLiteral("Image %1").arg(QString::fromLatin1(key)));
     }
 
@@ -92,12 +102,14 @@ private:
     StoredStudy mDestination;
     StoredStudy mSource;
     QAData& mJob;
+    bool mIsPreview;
     bool mIsMove = false;
     bool mSourceHasLabels = false;
     bool mDestinationHasLabels = false;  // or a new one is to have them
     bool mReordersImages = false;        // in volumes
     QString mTime;
-    QByteArray mBefore;  // the destination's file, of a move
+    QByteArray mBefore;         // the destination's file, of a move
+    QList<QByteArray> mImages;  // that the job means
     qint64 mLogBytes = 0;
     std::map<Series, QASeriesMove> mMoves;  // the destination's first: its own volumes come before new ones
     std::set<Series> mLeft;                 // series that lost images

@@ -9,6 +9,8 @@
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
 
+#include <QSet>
+
 #include <dcmtk/dcmdata/dcdeftag.h>
 
 #include <algorithm>
@@ -39,10 +41,38 @@ bool movesImages(const DcmTagKey& key)
     return key == DCM_StudyInstanceUID || key == DCM_SeriesInstanceUID || key == DCM_SOPInstanceUID;
 }
 
+/// What was named as a whole is meant as it is now, while nobody else can change it.
+void QAJob::selectImages()
+{
+    QSet<QByteArray> named;
+    const auto addImage = [&](const QByteArray& key) {
+        if (!named.contains(key))
+            mImages.append(key);
+        named.insert(key);
+    };
+    const auto add = [&](const TagMap& series) {
+        for (const TagMap* image : series.children())
+            addImage(StudyTree::imageKey(*image));
+    };
+    for (const QByteArray& key : qAsConst(mJob.images))
+        addImage(key);
+    for (const QByteArray& uid : qAsConst(mJob.series)) {
+        if (const TagMap* series = origin().findSeries(uid))
+            add(*series);
+        else if (!mIsMove || mDestination.tree().findSeries(uid) == nullptr)
+            mJob.outcome.notFound.append(uid);
+    }
+    if (mJob.isOfWholeStudy) {
+        for (const TagMap* series : origin().series())
+            add(*series);
+    }
+    mJob.outcome.asked = mImages.size();
+}
+
 Result QAJob::applyToImages()
 {
     Result result;
-    for (auto key = mJob.images.cbegin(); key != mJob.images.cend() && result.good(); ++key)
+    for (auto key = mImages.cbegin(); key != mImages.cend() && result.good(); ++key)
         result = applyTo(*key);
     return result;
 }
@@ -115,6 +145,10 @@ Result QAJob::note(Edit& edit)
     if (!mJob.timestamp.trimmed().isEmpty() && !mJob.login.isEmpty())
         edit.image.putAndInsertValue(kAuditTime, kOurPrivateCreator, VrCode::DT, mJob.timestamp);
     ++mJob.outcome.changed;
+    mJob.outcome.images.append({edit.key, edit.changes});
+    // Making one takes its time, and nobody will see it.
+    if (mIsPreview)
+        return {};
     if (edit.hasChanged(DCM_PixelData) && edit.image.findElement(kPreview) != nullptr)
         renewPreview(edit);
     return {};

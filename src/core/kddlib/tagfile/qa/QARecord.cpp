@@ -55,7 +55,9 @@ QARecord::~QARecord()
     }
 }
 
-Result QARecord::claim(const QAData& job)
+/// The studies in the order in which they are claimed, and those of them that the database knows. Where it knows none there
+/// is nothing to keep, and no catalogue.
+Result QARecord::open(const QAData& job, QList<QByteArray>& uids, QVector<QByteArray>& known)
 {
     const QByteArray address = Kxg::DatabaseServer();
     if (address.isEmpty())
@@ -63,7 +65,7 @@ Result QARecord::claim(const QAData& job)
         return {};
     Result result;
     std::unique_ptr<Kxg::Catalogue> catalogue = Kxg::Catalogue::open(address, result);
-    QList<QByteArray> uids = {job.studyUID};
+    uids = {job.studyUID};
     if (!job.oldStudyUID.isEmpty())
         uids.append(job.oldStudyUID);
     // The order of the files, so that two jobs that each move images to the other's study do not wait for each other.
@@ -72,7 +74,6 @@ Result QARecord::claim(const QAData& job)
                TagFileSettings::cacheFilePathForStudy(b.constData());
     });
     // All are looked up before one is claimed: where the database knows none there is nothing to keep.
-    QVector<QByteArray> known;
     for (const QByteArray& uid : qAsConst(uids)) {
         QVector<QByteArray> found;
         if (result.good())
@@ -84,9 +85,29 @@ Result QARecord::claim(const QAData& job)
     if (result.bad())
         return result.within(QString::fromLatin1(kNotKept));
     // Images that no database lists are not built again either, so there is nobody to be told.
-    if (known.isEmpty())
-        return {};
-    mCatalogue = std::move(catalogue);
+    if (!known.isEmpty())
+        mCatalogue = std::move(catalogue);
+    return {};
+}
+
+Result QARecord::consult(const QAData& job)
+{
+    QList<QByteArray> uids;
+    QVector<QByteArray> known;
+    const Result result = open(job, uids, known);
+    for (const QByteArray& uid : qAsConst(known))
+        mStudies[uid] = {};
+    return result;
+}
+
+Result QARecord::claim(const QAData& job)
+{
+    QList<QByteArray> uids;
+    QVector<QByteArray> known;
+    Result result = open(job, uids, known);
+    if (mCatalogue == nullptr)
+        return result;
+    mIsClaimed = true;
     for (const QByteArray& uid : qAsConst(uids)) {
         const bool isDestination = uid == job.studyUID;
         if (!isDestination && !known.contains(uid))
@@ -220,7 +241,7 @@ bool QARecord::identifyByLog(const QAImageChange& change, Kxg::ImageCorrection& 
 
 // ---- keeping it
 
-Result QARecord::record()
+Result QARecord::plan()
 {
     if (mCatalogue == nullptr)
         return {};
@@ -243,16 +264,24 @@ Result QARecord::record()
             // It came into being after this job had asked for it: now it can be claimed as well.
             if (mStudies.find(change.studyUID) == mStudies.end())
                 return lockedOut(reason);
+            mRefusedImage = change.key;
             // So that the job can be run when the build is done.
-            mCatalogue->requestBuild({change.studyUID}, Kxg::Catalogue::IfGone::PassOver);
+            if (mIsClaimed)
+                mCatalogue->requestBuild({change.studyUID}, Kxg::Catalogue::IfGone::PassOver);
             return Result::failure(reason);
         }
         result = add(change, former);
         mIsFinal = mIsFinal || change.replacedAnother;
     }
-    if (result.good() && !mRecorded.empty())
-        result = mCatalogue->recordCorrections(mRecorded, mRequests);
     return result.within(QString::fromLatin1(kNotKept));
+}
+
+Result QARecord::record()
+{
+    Result result = plan();
+    if (result.good() && !mRecorded.empty())
+        result = mCatalogue->recordCorrections(mRecorded, mRequests).within(QString::fromLatin1(kNotKept));
+    return result;
 }
 
 Result QARecord::add(const QAImageChange& change, const Kxg::ImageCorrection& former)

@@ -6,6 +6,7 @@
 #include "platform/database/Catalogue.h"
 
 #include <QByteArray>
+#include <QList>
 #include <QMap>
 #include <QVector>
 
@@ -46,11 +47,20 @@ public:
     /// Claims the studies in the order in which tag files are held.
     Result claim(const QAData& job);
 
+    /// Without claims, for whoever only asks whether `record` would do: the studies are others'.
+    Result consult(const QAData& job);
+
     void note(const QAImageChange& change) { mChanges.push_back(change); }
 
     /// Keeps all that was noted, in one transaction. Not when the database knows of corrections that the tag files do
     /// not show yet.
     Result record();
+
+    /// The same without keeping anything.
+    Result plan();
+
+    /// The image because of which nothing was recorded; empty: there is none.
+    const QByteArray& refusedImage() const { return mRefusedImage; }
 
     /// Whether `claim` or `record` failed because others only have to finish what they do: then try again.
     bool wasLockedOut() const { return mIsLockedOut; }
@@ -72,6 +82,7 @@ private:
         std::vector<Kxg::ImageCorrection> corrections;
     };
 
+    Result open(const QAData& job, QList<QByteArray>& uids, QVector<QByteArray>& known);
     Result claimOne(const QByteArray& studyUID, bool isDestination);
     Result lockedOut(const QString& reason);
     Result read();
@@ -88,6 +99,8 @@ private:
     std::vector<Kxg::ImageCorrection> mRecorded;
     std::vector<Kxg::ImageCorrection> mFormer;
     QMap<QByteArray, qint64> mRequests;
+    QByteArray mRefusedImage;
+    bool mIsClaimed = false;
     bool mIsFinal = false;  // taking it back would do more than that
     bool mIsLockedOut = false;
 };

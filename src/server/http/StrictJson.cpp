@@ -1,9 +1,9 @@
-#include "server/access/StrictJson.h"
+#include "server/http/StrictJson.h"
 
 #include <QJsonArray>
 #include <QJsonDocument>
 
-namespace Kdd::Access
+namespace Kdd::Http
 {
 namespace
 {
@@ -54,15 +54,4 @@ bool parseObject(const QByteArray& text, QJsonObject& object)
     return true;
 }
 
-bool decodeBase64Url(const QByteArray& text, QByteArray& bytes)
-{
-    constexpr auto kForm = QByteArray::Base64UrlEncoding | QByteArray::OmitTrailingEquals;
-    const QByteArray decoded = QByteArray::fromBase64(text, kForm);
-    // The decoder passes over what it does not know; written again that is missing.
-    if (decoded.toBase64(kForm) != text)
-        return false;
-    bytes = decoded;
-    return true;
-}
-
-}  // namespace Kdd::Access
+}  // namespace Kdd::Http

@@ -1,0 +1,34 @@
+#pragma once
+
+#include "server/dicomweb/Resource.h"
+#include "server/dicomweb/change/Turns.h"
+#include "server/dicomweb/store/ThreadCatalogue.h"
+
+namespace Kdd::DicomWeb
+{
+
+/// Removes a study, a series or an instance from the archive. The DICOM files stay where they are.
+class RemovalResource : public Resource
+{
+public:
+    /// Both outlive the object.
+    RemovalResource(const ThreadCatalogue& database, Turns& turns)
+        : mDatabase(database)
+        , mTurns(turns)
+    {
+    }
+
+    bool owns(const ResourcePath& /*path*/) const override { return false; }
+    Http::Response answer(const Http::Request& request, const ResourcePath& path) override;
+    bool removes(const ResourcePath& path) const override;
+
+    /// 200 with {"study": "1.2", "images": 20}, the images that are gone; 404: there is no such thing; 503: others work on
+    /// the study.
+    Http::Response remove(const Http::Request& request, const ResourcePath& path) override;
+
+private:
+    const ThreadCatalogue& mDatabase;
+    Turns& mTurns;
+};
+
+}  // namespace Kdd::DicomWeb

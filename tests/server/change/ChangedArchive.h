@@ -1,0 +1,139 @@
+#pragma once
+
+#include "server/Server.h"
+#include "server/http/Client.h"
+#include "support/DatasetBuilder.h"
+#include "support/FileContent.h"
+#include "support/LogCapture.h"
+#include "support/PostgresServer.h"
+#include "support/TemporaryStore.h"
+
+#include <QJsonArray>
+#include <QJsonDocument>
+#include <QJsonObject>
+#include <QProcess>
+
+#include <gtest/gtest.h>
+#include <kddlib/Kxg.h>
+#include <kddlib/TagFile.h>
+
+namespace Kdd
+{
+
+/// A server that takes objects and corrections, and deletes, over a store of its own.
+class ChangedArchive : public testing::Test
+{
+protected:
+    explicit ChangedArchive(const QByteArray& database = {})
+        : mDatabase(database.isEmpty() ? "sqlite:" + mStore.filePath("kdd.sqlite").toUtf8() : database)
+    {
+        Kxg::SetDatabaseServer(mDatabase);
+        mSettings.http.address = {"127.0.0.1", 0};
+        mSettings.objects.emplace();
+        mSettings.objects->folder = mStore.filePath("objects").toUtf8();
+        mSettings.objects->freeBytes = 0;
+        mSettings.changes.corrections = true;
+        mSettings.changes.deletions = true;
+    }
+
+    void start()
+    {
+        Result result;
+        mServer.reset();
+        mServer = Server::make(mSettings, result);
+        ASSERT_NE(mServer, nullptr) << result.text().toStdString();
+        ASSERT_TRUE(mServer->start().good());
+    }
+
+    Reply ask(const QByteArray& method, const QByteArray& path, const QByteArray& type = {},
+              const QByteArray& body = {}, const QByteArray& headers = {}) const
+    {
+        Client client(mServer->address());
+        client.send(method + ' ' + path + " HTTP/1.1\r\nHost: localhost\r\n" +
+                    (type.isEmpty() ? QByteArray() : "Content-Type: " + type + "\r\n") +
+                    "Content-Length: " + QByteArray::number(body.size()) + "\r\n" + headers + "\r\n" + body);
+        return client.reply();
+    }
+    Reply get(const QByteArray& path, const QByteArray& headers = {}) const
+    {
+        return ask("GET", "/dicom-web" + path, {}, {}, headers);
+    }
+    Reply remove(const QByteArray& path) const { return ask("DELETE", "/dicom-web" + path); }
+
+    /// A job in JSON, of a study; `query` begins with "?".
+    Reply correct(const QByteArray& study, const QByteArray& query, const QByteArray& job,
+                  const QByteArray& headers = {}) const
+    {
+        return ask("POST", "/dicom-web/studies/" + study + "/corrections" + query, "application/json", job,
+                   headers);
+    }
+
+    /// Sends an image; its path below that of DICOMweb, where it is told to be.
+    void store(const DatasetBuilder& image) const
+    {
+        const QByteArray path = mStore.filePath("sent.dcm").toUtf8();
+        DcmDataset copy(image.build());
+        DcmFileFormat format(&copy);
+        ASSERT_TRUE(format.saveFile(path.constData(), EXS_LittleEndianExplicit).good());
+        EXPECT_EQ(ask("POST", "/dicom-web/studies", "application/dicom", fileContent(QString::fromUtf8(path)))
+                      .status,
+                  200);
+    }
+
+    /// Two images in series 1.2.3, one in 1.2.4, all of study 1.2.
+    void storeStudy() const
+    {
+        for (const char* uid : {"1.2.3.1", "1.2.3.2"})
+            store(anImage(uid).with(DCM_PatientName, "Doe^John").with(DCM_PatientID, "7"));
+        store(anImage("1.2.4.1").inSeries("1.2.4").with(DCM_PatientName, "Doe^John"));
+    }
+
+    static QJsonObject objectOf(const Reply& reply) { return QJsonDocument::fromJson(reply.body).object(); }
+
+    /// The values of an attribute of all images of a study, by UID, separated by blanks.
+    std::string values(const QByteArray& study, const char* key) const
+    {
+        QMap<QString, QString> texts;
+        const QJsonArray images =
+            QJsonDocument::fromJson(get("/studies/" + study + "/metadata").body).array();
+        const auto valueOf = [](const QJsonValue& image, const char* name) {
+            const QJsonValue value = image[QLatin1String(name)][QLatin1String("Value")][0];
+            return (value.isObject() ? value[QLatin1String("Alphabetic")] : value).toVariant().toString();
+        };
+        for (const QJsonValue image : images)
+            texts.insert(valueOf(image, "00080018"), valueOf(image, key));
+        return QStringList(texts.values()).join(QLatin1Char(' ')).toStdString();
+    }
+
+    /// "corrected deleted", as the feed of changes tells of a study.
+    std::string feed(const QByteArray& study) const
+    {
+        QStringList kinds;
+        const QJsonArray changes = objectOf(get("/changefeed"))[QLatin1String("changes")].toArray();
+        for (const QJsonValue change : changes)
+            if (change[QLatin1String("study")].toString().toLatin1() == study)
+                kinds << change[QLatin1String("change")].toString();
+        return kinds.join(QLatin1Char(' ')).toStdString();
+    }
+
+    /// Runs the tool over the same archive.
+    void kdd(const QStringList& arguments) const
+    {
+        QProcess process;
+        process.start(QStringLiteral(KDD_BINARY),
+                      QStringList{QStringLiteral("--store"), mStore.folder(), QStringLiteral("--meta"),
+                                  QString::fromUtf8(TagFile::metaFolder()), QStringLiteral("--database"),
+                                  QString::fromUtf8(mDatabase), QStringLiteral("--quiet")} +
+                          arguments);
+        ASSERT_TRUE(process.waitForFinished(120000));
+        ASSERT_EQ(process.exitCode(), 0) << process.readAllStandardError().toStdString();
+    }
+
+    LogCapture mLog;
+    TemporaryStore mStore;
+    QByteArray mDatabase;
+    ServerSettings mSettings;
+    std::unique_ptr<Server> mServer;
+};
+
+}  // namespace Kdd
