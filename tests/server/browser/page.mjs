@@ -1,15 +1,15 @@
 // Walks the study browser in headless Chromium by keyboard, as a reader does: list, study, image, differences, volumes,
 // corrections. A study of the archive bears a name that is markup, and nothing of it may come alive.
 //
-// usage: node page.mjs http://HOST:PORT [FOLDER FOR PICTURES]
+// usage: node page.mjs http://HOST:PORT FOLDER-TO-UPLOAD [FOLDER FOR PICTURES]
 //
 // Modules are looked for in KDD_NODE_MODULES, the browser in CHROMIUM.
 
 import { createRequire } from 'node:module';
-import { mkdirSync } from 'node:fs';
+import { mkdirSync, readdirSync } from 'node:fs';
 import { join } from 'node:path';
 
-const [, , root, folder] = process.argv;
+const [, , root, uploads, folder] = process.argv;
 const require = createRequire(`${process.env.KDD_NODE_MODULES}/`);
 const puppeteer = require('puppeteer-core');
 
@@ -238,6 +238,41 @@ async function walkDelete(study) {
   await present('.series');
 }
 
+/** "Stored 3, Refused 1" */
+const outcomes = () => page.$$eval('.outcome-count', (all) => all.map((one) => one.textContent).join(', '));
+
+async function uploaded(what, expected) {
+  await until(`the end of ${what}`, () => document.querySelector('.upload-line')?.textContent.startsWith('Done'));
+  const found = await outcomes();
+  check(found === expected, `${what}: ${found}, not ${expected}`);
+}
+
+/** Files by the button, then their folder by dropping it: some are there by then. */
+async function walkUpload() {
+  await page.goto(`${root}/#/`);
+  await present('.study');
+  await page.focus('.upload-link');
+  await page.keyboard.press('Enter');
+  await present('.drop-zone');
+  await shoot('upload-empty');
+  const files = readdirSync(uploads, { withFileTypes: true }).filter((one) => one.isFile()).map((one) => join(uploads, one.name));
+  await (await page.$('#upload-files')).uploadFile(...files);
+  await uploaded('the files', 'Refused 1, Stored 3, Passed over 1');
+  check((await text('.upload-row.is-refused .told')).includes('no sound DICOM object'), 'it is not told why an object is refused');
+  await page.goto(`${root}/#/`);
+  await present('.study');
+  const link = await page.createCDPSession();
+  const drop = (type) => link.send('Input.dispatchDragEvent', { type, x: 300, y: 300, data: { items: [], files: [uploads], dragOperationsMask: 1 } });
+  for (const type of ['dragEnter', 'dragOver', 'drop']) await drop(type);
+  await present('.upload-row.is-known');
+  await uploaded('the folder', 'Refused 2, Stored 5, Was there 3, Passed over 2');
+  check(await address() === '#/upload', 'a drop on the list does not lead to the upload');
+  await shoot('upload');
+  await page.$$eval('.upload-row.is-stored a', (links) => links[0].focus());
+  await page.keyboard.press('Enter');
+  await present('.strip .tile[href]');
+}
+
 async function walkOffline() {
   await page.goto(`${root}/#/`);
   await present('.study');
@@ -263,6 +298,7 @@ try {
   await walkSides();
   await walkHostile();
   await walkDelete(await walkCorrect());
+  await walkUpload();
   await walkOffline();
 } catch (error) {
   faults.push(String(error));

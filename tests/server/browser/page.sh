@@ -41,7 +41,19 @@ XML
 "$kdd" --quiet qa "$folder/job.xml" --study "$study" --image "$image"
 
 mkfifo "$folder/said"
-"$kdd" serve --corrections --deletions --listen 127.0.0.1:0 >"$folder/said" &
+# To be uploaded: three images and one that is cut, a text, and a folder with two more.
+"$kdd" --quiet sample "$folder/more" --images 60 --seed 9
+mkdir -p "$folder/uploads/below"
+find "$folder/more" -name '*.dcm' -path '*/CT-1/*' | sort >"$folder/found"
+for i in 1 2 3 4 5 6; do
+    into=$folder/uploads
+    [ "$i" -le 4 ] || into=$folder/uploads/below
+    cp "$(sed -n "${i}p" "$folder/found")" "$into/$i.dcm"
+done
+truncate -s 3000 "$folder/uploads/4.dcm"
+echo "no image" >"$folder/uploads/read-me.txt"
+
+KDD_FREE_SPACE=0 "$kdd" serve --stow --corrections --deletions --listen 127.0.0.1:0 >"$folder/said" &
 server=$!
 read -r said <"$folder/said"
-node "$here/page.mjs" "${said##* }" "$pictures"
+node "$here/page.mjs" "${said##* }" "$folder/uploads" "$pictures"

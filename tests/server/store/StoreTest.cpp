@@ -188,12 +188,14 @@ TEST_F(StoreTest, TakesAnObjectOnceHoweverOftenItComes)
         sender.join();
     for (const std::string& answer : answers)
         EXPECT_EQ(answer, "200 1.2.3.1");
+    EXPECT_TRUE(post(partOf(object) + "--cut--").body.contains("KNOWN"));
+    EXPECT_FALSE(store(anImage("1.2.3.2")).body.contains("KNOWN"));
     // Another sender writes meta information of its own.
     QByteArray sentOn = object;
     sentOn[5] = 'x';
     EXPECT_EQ(told(post(sentOn, "/studies", "application/dicom")), "200 1.2.3.1");
-    EXPECT_EQ(instances("1.2"), 1);
-    EXPECT_EQ(filesBelowObjects(), 1);
+    EXPECT_EQ(instances("1.2"), 2);
+    EXPECT_EQ(filesBelowObjects(), 2);
 }
 
 TEST_F(StoreTest, FollowsTheRuleForOtherContentOfTheSameUid)
@@ -310,11 +312,38 @@ TEST_F(StoreTest, TellsInXmlToWhomWantsThat)
     EXPECT_TRUE(reply.body.contains("<Value number=\"1\">1.2.3.1</Value>"));
 }
 
+TEST_F(StoreTest, TellsOthersOfAStudyOnceForManyArrivals)
+{
+    constexpr int kObjects = 1000;
+    constexpr int kAtOnce = 50;  // objects are stored so many at a time
+    start();
+    QByteArray body;
+    for (int i = 1; i <= kObjects; ++i)
+        body += partOf(fileOf(anImage(("1.2.3." + QByteArray::number(i)).constData())));
+    EXPECT_EQ(post(body + "--cut--").status, 200);
+    EXPECT_EQ(instances("1.2"), kObjects);
+    ASSERT_EQ(get("/studies/1.2/metadata").status, 200);
+    const QJsonArray changes = QJsonDocument::fromJson(get("/changefeed?limit=1000").body)
+                                   .object()
+                                   .value(QLatin1String("changes"))
+                                   .toArray();
+    EXPECT_GE(changes.size(), 1);
+    EXPECT_LE(changes.size(), kObjects / kAtOnce);
+}
+
 TEST_F(StoreTest, TakesNothingUnlessItIsToldTo)
 {
+    const auto may = [&] {
+        Client client(mServer->address());
+        client.get("/browser/config");
+        return QJsonDocument::fromJson(client.reply().body).object().value(QLatin1String("may")).toArray();
+    };
+    start();
+    EXPECT_EQ(may(), QJsonArray{QStringLiteral("store")});
     mSettings.objects.reset();
     start();
     EXPECT_EQ(store(anImage("1.2.3.1")).status, 405);
+    EXPECT_EQ(may(), QJsonArray());
 }
 
 }  // namespace

@@ -1,6 +1,7 @@
 // Finds the view for the page's address and puts it in place.
 //
 //   #/?name=doe&modality=CT                 studies that fit
+//   #/upload                                for those who may
 //   #/studies/1.2                           a study
 //   #/studies/1.2/volumes, /corrections
 //   #/studies/1.2/correct, /delete          for those who may
@@ -17,10 +18,12 @@ import { differenceView } from './difference.js';
 import { imageView } from './image.js';
 import { removeView } from './remove.js';
 import { studyView } from './study.js';
+import { uploadView } from './upload.js';
 import { volumesView } from './volumes.js';
 
 const views = [
   [/^\/?$/, listView],
+  [/^\/upload$/, uploadView],
   [/^\/studies\/([^/]+)$/, studyView],
   [/^\/studies\/([^/]+)\/volumes$/, volumesView],
   [/^\/studies\/([^/]+)\/corrections$/, correctionsView],

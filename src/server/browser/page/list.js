@@ -1,9 +1,10 @@
 // The list of studies, searched while one types.
 
-import { addresses, Failure, searchStudies } from './api.js';
+import { addresses, config, Failure, searchStudies } from './api.js';
 import { announce, h, icon, picture, state, waiting } from './dom.js';
 import { age, amount, date, first, personName, sexes, time, values } from './format.js';
 import { hints, isTyping, roving, vertical } from './keys.js';
+import { dropsLeadToUpload, progressLink } from './upload.js';
 
 const pageSize = 50;
 const pause = 220; // [ms] without a key before the server is asked
@@ -209,9 +210,11 @@ export function listView(view, query) {
   view.title('Studies');
   const list = new StudyList(view, query);
   view.replace(h('header', { class: 'top' }, h('a', { class: 'home', href: '#/' },
-    h('img', { src: 'page/icon.svg', alt: '', width: 24, height: 24 }), h('h1', {}, 'Studies'))),
+    h('img', { src: 'page/icon.svg', alt: '', width: 24, height: 24 }), h('h1', {}, 'Studies')),
+  config.may.includes('store') && progressLink(view)),
   h('div', { class: 'search' }, list.form), list.count, list.results,
   hints(h, [[['/'], 'search'], [['↓', '↑'], 'move'], [['Enter'], 'open'], [['Esc'], 'clear']]));
+  if (config.may.includes('store')) dropsLeadToUpload(view);
   view.keys = {
     '/': () => list.form.elements.name.select() ?? list.form.elements.name.focus(),
     ArrowDown: (event) => (event.target.closest('.studies') ? false : list.list.querySelector('.study')?.focus()),

@@ -17,6 +17,10 @@ const QString kFailedObjects = QStringLiteral("00081198");
 const QString kStoredObjects = QStringLiteral("00081199");
 const QString kOtherFailures = QStringLiteral("0008119A");
 
+// Ours: that the archive had the object. The standard has no word for it.
+const QString kCreator = QStringLiteral("00090010");
+const QString kKnown = QStringLiteral("00091001");
+
 QJsonObject element(const char* vr, const QJsonArray& values)
 {
     return {{QStringLiteral("vr"), QLatin1String(vr)}, {QStringLiteral("Value"), values}};
@@ -46,6 +50,8 @@ void writeXml(QXmlStreamWriter& xml, const QJsonObject& object)
 {
     for (auto it = object.begin(); it != object.end(); ++it) {
         const QJsonObject attribute = it.value().toObject();
+        if (keywordOf(it.key()) == nullptr)
+            continue;
         xml.writeStartElement(QStringLiteral("DicomAttribute"));
         xml.writeAttribute(QStringLiteral("tag"), it.key());
         xml.writeAttribute(QStringLiteral("vr"), attribute.value(QLatin1String("vr")).toString());
@@ -115,6 +121,10 @@ void StoreReport::add(const ArrivedObject& object)
     addText(entry, kRetrieveUrl, "UR",
             mRoot + "/studies/" + object.studyUID + "/series/" + object.seriesUID + "/instances/" +
                 object.image);
+    if (object.isKnown) {
+        addText(entry, kCreator, "LO", "KDD");
+        addText(entry, kKnown, "CS", "KNOWN");
+    }
     mAreOfOneStudy = mAreOfOneStudy && (mOneStudy.isEmpty() || mOneStudy == object.studyUID);
     mOneStudy = object.studyUID;
     mStored.append(entry);
