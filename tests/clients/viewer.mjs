@@ -1,12 +1,15 @@
 // Opens studies of each kind in a viewer's page under headless Chromium, as readers do, and looks at what is shown. Answers
 // that failed, errors of the page's programs and dialogs that tell of failures are faults.
 //
-// usage: node viewer.mjs http://localhost:PORT FOLDER [KIND...]      FOLDER receives screenshots
+// usage: node viewer.mjs http://localhost:PORT FOLDER FILE [KIND...]
+//
+// FOLDER receives screenshots. FILE is brought in by the viewer before anything is opened. The one kind "reading" is for a
+// server that takes no objects.
 
 import { check, report, root, value } from './archive.mjs';
 import { kPatience, launch, newPage as newViewerPage, timing } from './pictures.mjs';
 
-const [folder, ...chosen] = process.argv.slice(3);
+const [folder, file, ...chosen] = process.argv.slice(3);
 
 const kUrl = 'viewer?StudyInstanceUIDs=';
 
@@ -90,8 +93,50 @@ async function searchList() {
   await page.close();
 }
 
+const buttonOf = (page, words) => page.waitForFunction((text) => [...document.querySelectorAll('button')]
+  .find((one) => one.innerText.trim() === text), { polling: 100 }, words);
+
+async function openList(name) {
+  const page = await newPage(name);
+  await page.goto(`${root}/viewer/`, { waitUntil: 'domcontentloaded' });
+  await page.waitForFunction(() => document.querySelectorAll('tbody tr').length > 1, { polling: 100 });
+  return page;
+}
+
+async function findNoUpload() {
+  const page = await openList('reading');
+  check(!await page.evaluate(() => [...document.querySelectorAll('button')].some((one) => one.innerText.trim() === 'Upload')),
+    'reading: an upload is offered by a server that takes no objects');
+  await page.close();
+}
+
+/// Drops the file on the dialogue; the list shows its study then.
+async function uploadFile() {
+  const page = await openList('upload');
+  await (await buttonOf(page, 'Upload')).click();
+  const place = await page.waitForFunction(() => [...document.querySelectorAll('div')]
+    .find((one) => one.innerText === 'or drag images or folders here'), { polling: 100 });
+  const { x, y } = await place.clickablePoint();
+  const link = await page.createCDPSession();
+  for (const type of ['dragEnter', 'dragOver', 'drop'])
+    await link.send('Input.dispatchDragEvent', { type, x, y, data: { items: [], files: [file], dragOperationsMask: 1 } });
+  const close = await buttonOf(page, 'Close');
+  check(await page.evaluate(() => document.body.innerText.includes('Completed!')), 'upload: it is not told as completed');
+  await page.screenshot({ path: `${folder}/upload.png` });
+  await close.click();
+  await page.waitForFunction(() => [...document.querySelectorAll('tbody tr')].some((one) => one.innerText.startsWith('Viewer, XA')),
+    { polling: 100 }).catch(() => check(false, 'upload: the list does not show what was brought in'));
+  await page.close();
+}
+
+if (chosen.includes('reading')) {
+  await findNoUpload();
+  await browser.close();
+  report('1 list');
+}
+await uploadFile();
 if (chosen.length === 0 || chosen.includes('list')) await searchList();
 const opened = kinds.filter(({ name }) => chosen.length === 0 || chosen.includes(name));
 for (const kind of opened) await openKind(kind).catch((error) => check(false, `${kind.name}: ${error.message}`));
 await browser.close();
-report(`${opened.length + 1} kinds`);
+report(`${opened.length + 2} kinds`);

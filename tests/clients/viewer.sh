@@ -18,8 +18,14 @@ need node "${CHROMIUM:-/usr/bin/chromium}" "$KDD_NODE_MODULES/puppeteer-core" "$
 
 "$kdd" --quiet sample "$folder/day" --images 400
 node "$here/objects.mjs" "$folder/objects" "$images"
+# This one comes in by the viewer.
+mv "$folder/objects/xa.dcm" "$folder/upload.dcm"
 "$kdd" --quiet add "$folder/day" "$folder/objects" >/dev/null
-serve --viewer "$viewer"
 mkdir -p "$pictures"
 # The viewer's programs take "localhost" for a secure place.
-node "$here/viewer.mjs" "http://localhost:${root##*:}" "$pictures" "${@:6}"
+look() { node "$here/viewer.mjs" "http://localhost:${root##*:}" "$pictures" "$folder/upload.dcm" "$@"; }
+serve --viewer "$viewer"
+look reading
+stop
+KDD_FREE_SPACE=0 serve --stow --viewer "$viewer"
+look "${@:6}"

@@ -3,6 +3,8 @@
 #include "kddlib/tagfile/qa/QAData.h"
 #include "support/PostgresServer.h"
 
+#include <QJsonDocument>
+#include <QJsonObject>
 #include <QSettings>
 
 using namespace Kdd;
@@ -13,6 +15,41 @@ namespace
 /// What the pages show, done as they say.
 class Blocks : public SampleArchive
 {
+protected:
+    /// A job, said of an image that is there.
+    static QString withOwnImages(QString job)
+    {
+        return job
+            .replace(QLatin1String("1.2.840.1.1"),
+                     QStringLiteral("2.25.118095209191961083373906363074726608325"))
+            .replace(QLatin1String("\"1.2.840.1.2\""), QString())
+            .replace(QLatin1String("1.2.840.1"),
+                     QStringLiteral("2.25.206249426979943135884564004311187862184"));
+    }
+
+    /// An access file with a member that its page shows alone.
+    static QJsonObject withMember(QJsonObject file, const QJsonObject& member)
+    {
+        const QString name = member.begin().key();
+        QJsonObject tokens = file.value(QLatin1String("tokens")).toObject();
+        const bool isOfTokens = name == QLatin1String("studies");
+        (isOfTokens ? tokens : file).insert(name, member.begin().value());
+        file.insert(QStringLiteral("tokens"), tokens);
+        // Beside limits nobody else may have a right.
+        if (isOfTokens)
+            file.remove(QStringLiteral("anyone"));
+        return file;
+    }
+
+    /// The file is good as far as another one that is not there.
+    void expectRefusal(const char* command, const QByteArray& file, const char* missing) const
+    {
+        putBeside("block.json", file);
+        const Answer answer =
+            shell({QStringLiteral("KDD_SERVER_LISTEN=127.0.0.1:0 ") + QLatin1String(command)});
+        EXPECT_EQ(answer.exitCode, 1) << command;
+        EXPECT_TRUE(answer.err.contains(missing)) << command << answer.err.toStdString();
+    }
 };
 
 TEST_F(Blocks, AllSayInWhichLanguageTheyAreAndAreTested)
@@ -125,18 +162,29 @@ TEST_F(Blocks, InXmlAreJobsAndInIniAreSettings)
     }
 }
 
-TEST_F(Blocks, InJsonAreAccessFilesOrPeersFiles)
+/// Jobs are done, files of rights and peers are read by the server, and what is an answer is well formed.
+TEST_F(Blocks, InJsonAreWhatTheirPagesSay)
 {
+    fill();
+    QJsonObject rights;
     for (const Block& block : blocksIn("json")) {
-        putBeside("access.json", block.text.toUtf8());
-        // It would run for ever with a certificate.
-        const bool isPeers = block.place().find("dimse.md") != std::string::npos;
-        const Answer answer =
-            shell({isPeers ? QStringLiteral("kdd receive 0 --peers access.json")
-                           : QStringLiteral("KDD_SERVER_LISTEN=127.0.0.1:0 kdd serve --access access.json "
-                                            "--tls-cert none.pem --tls-key none.pem")});
-        EXPECT_EQ(answer.exitCode, 1) << block.place() << answer.err.toStdString();
-        EXPECT_TRUE(answer.err.contains(isPeers ? "tls.pem" : "none.pem")) << answer.err.toStdString();
+        // Some are whole, some a member.
+        const bool isMember = !block.text.startsWith(QLatin1Char('{'));
+        const QString text = isMember ? QStringLiteral("{%1}").arg(block.text) : block.text;
+        const QJsonObject object = QJsonDocument::fromJson(text.toUtf8()).object();
+        EXPECT_FALSE(object.isEmpty()) << block.place();
+        if (object.contains(QLatin1String("tags"))) {
+            putBeside("block.json", withOwnImages(text).toUtf8());
+            const Answer answer = shell({QStringLiteral("kdd qa block.json --study 1.2.840.2")});
+            EXPECT_EQ(answer.out, "1 images: 1 changed, 1 moved, 0 not found\n") << answer.err.toStdString();
+        } else if (block.place().find("dimse.md") != std::string::npos) {
+            expectRefusal("kdd receive 0 --peers block.json", text.toUtf8(), "tls.pem");
+        } else if (isMember || object.contains(QLatin1String("tokens"))) {
+            rights = isMember ? withMember(rights, object) : object;
+            // It would run for ever with a certificate.
+            expectRefusal("kdd serve --access block.json --tls-cert none.pem --tls-key none.pem",
+                          isMember ? QJsonDocument(rights).toJson() : text.toUtf8(), "none.pem");
+        }
     }
 }
 

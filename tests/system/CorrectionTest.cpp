@@ -60,6 +60,42 @@ TEST_F(Correction, TellsWhatItDid)
     EXPECT_EQ(correct(file("job.xml"), "--study 1.2 --image 4").exitCode, 0) << "it is done already";
 }
 
+TEST_F(Correction, IsPreviewedWithoutAnyChange)
+{
+    addTwoStudies();
+    const QByteArray before = kdd("metadata 1.2").out;
+    job("", kPatientName, "Roe^R");
+    const Answer told = kdd("qa @job.xml --study 1.2 --image 1 2 9 --preview");
+    EXPECT_EQ(told.out, "2 images:\n  00100010 PatientName: \"Doe^J\" -> \"Roe^R\"\n"
+                        "3 images: 2 would be changed, 0 moved, 1 not found\n");
+    EXPECT_EQ(told.exitCode, 1);
+    const Answer move = correct(job("1.3", kSeries, "1.2.9"), "--study 1.2 --image 4 --preview");
+    EXPECT_EQ(move.number("moved"), 1);
+    EXPECT_EQ(move.json("changes")[0][QLatin1String("images")], QJsonArray{QStringLiteral("4")});
+    EXPECT_EQ(
+        correct(job("", "Group='0010' Element='0030'", "soon"), "--study 1.2 --image 1 --preview").exitCode,
+        1);
+    EXPECT_EQ(kdd("metadata 1.2").out, before);
+    EXPECT_EQ(imagesOf("1.3"), 1);
+}
+
+TEST_F(Correction, TakesItsJobAsJsonToo)
+{
+    addTwoStudies();
+    const auto ask = [&](const QByteArray& text) {
+        put("job.json", text);
+        return kdd("qa --json @job.json --study 1.2");
+    };
+    const Answer done = ask("\n {\"tags\": [{\"tag\": \"00100010\", \"value\": \"Roe^R\"}],"
+                            " \"series\": [\"1.2.4\"], \"images\": [\"1\"]}");
+    EXPECT_EQ(done.out, "{\"changed\":3,\"images\":3,\"moved\":0,\"notFound\":0}\n");
+    EXPECT_FALSE(kdd("metadata 1.2").out.contains("Doe^J"));
+    EXPECT_TRUE(ask(R"({"series": ["7"]})").err.contains("There is no series 7 in study 1.2"));
+    EXPECT_TRUE(
+        ask(R"({"series": ["1.2.4"], "series": []})").err.contains("job.json: The job is no JSON object"));
+    EXPECT_EQ(ask("{}").exitCode, 2) << "no images";
+}
+
 /// Whenever the process dies, no image is lost, and running the job again completes it as if nothing had happened. Both
 /// studies have so much else that the time between the two writes is a good part of the whole.
 TEST_F(Correction, MovesThatAreKilledAreCompletedByTheNext)

@@ -106,7 +106,13 @@ Http::Response BrowserService::config(const Http::Request& request) const
 Http::Response BrowserService::lookAt(const QByteArray& uid, const Look& look) const
 {
     std::shared_ptr<const DicomWeb::ServedStudy> study;
-    const DicomWeb::Presence presence = mShelf.find(uid, study);
+    DicomWeb::Arrivals* const arrivals = mShelf.arrivals();
+    // Whoever uploads looks at once at what came of it.
+    if (arrivals != nullptr)
+        arrivals->bringInOwn(uid);
+    DicomWeb::Presence presence = mShelf.find(uid, study);
+    if (presence == DicomWeb::Presence::Absent && arrivals != nullptr && arrivals->bringIn(uid))
+        presence = mShelf.find(uid, study);
     if (presence != DicomWeb::Presence::Found)
         return notThere(presence);
     return study->look([&](const TagFile& file) { return look(file, study->version()); });

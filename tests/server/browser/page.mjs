@@ -1,15 +1,15 @@
 // Walks the study browser in headless Chromium by keyboard, as a reader does: list, study, image, differences, volumes,
-// corrections. A study of the archive bears a name that is markup, and nothing of it may come alive.
+// corrections, uploads. A study of the archive bears a name that is markup, and nothing of it may come alive.
 //
-// usage: node page.mjs http://HOST:PORT [FOLDER FOR PICTURES]
+// usage: node page.mjs http://HOST:PORT FOLDER-TO-UPLOAD [FOLDER FOR PICTURES]
 //
 // Modules are looked for in KDD_NODE_MODULES, the browser in CHROMIUM.
 
 import { createRequire } from 'node:module';
-import { mkdirSync } from 'node:fs';
+import { mkdirSync, readdirSync, readFileSync } from 'node:fs';
 import { join } from 'node:path';
 
-const [, , root, folder] = process.argv;
+const [, , root, uploads, folder] = process.argv;
 const require = createRequire(`${process.env.KDD_NODE_MODULES}/`);
 const puppeteer = require('puppeteer-core');
 
@@ -238,6 +238,100 @@ async function walkDelete(study) {
   await present('.series');
 }
 
+/** "Refused 1, Stored 3" */
+const outcomes = () => page.$$eval('.outcome-count', (all) => all.map((one) => one.textContent).join(', '));
+
+async function uploaded(what, expected) {
+  await until(`the end of ${what}`, (counts) => document.querySelector('.upload-line')?.textContent.startsWith('Done') &&
+    [...document.querySelectorAll('.outcome-count')].map((one) => one.textContent).join(', ') === counts, expected);
+  const found = await outcomes();
+  check(found === expected, `${what}: ${found}, not ${expected}`);
+}
+
+/** By the keyboard. */
+async function choose(...files) {
+  const waiting = page.waitForFileChooser();
+  await page.focus('.choosers .button');
+  await page.keyboard.press('Enter');
+  await (await waiting).accept(files.map((one) => join(uploads, one)));
+}
+
+async function press(label) {
+  const button = await page.evaluateHandle((words) => [...document.querySelectorAll('.button')].find((one) => one.textContent === words), label);
+  await button.focus();
+  await page.keyboard.press('Enter');
+}
+
+/** Files by the button, then their folder by dropping it on the list; some are there by then. */
+async function walkUpload() {
+  await page.goto(`${root}/#/`);
+  await present('.study');
+  await page.focus('.upload-link');
+  await page.keyboard.press('Enter');
+  await present('.drop-zone');
+  await shoot('upload-empty');
+  await choose(...readdirSync(uploads, { withFileTypes: true }).filter((one) => one.isFile()).map((one) => one.name));
+  await uploaded('the files', 'Refused 1, Skipped 2, Stored 3');
+  check((await text('.upload-row.is-refused')).startsWith('Refused4.dcmIt is damaged'), 'it is not told what is refused, and why');
+  check(await page.$$eval('.is-skipped .path', (all) => all.some((one) => one.textContent === '<b>read-me<b>.txt')), 'a name that is markup is not shown as text');
+  const study = await page.$eval('.upload-studies a', (link) => link.textContent.split(' ')[1]);
+  await page.keyboard.press('Escape');
+  await present(`.study[data-uid="${study}"]`);
+  const link = await page.createCDPSession();
+  const drop = (type) => link.send('Input.dispatchDragEvent', { type, x: 300, y: 300, data: { items: [], files: [uploads], dragOperationsMask: 1 } });
+  for (const type of ['dragEnter', 'dragOver', 'drop']) await drop(type);
+  await uploaded('the folder', 'Refused 2, Skipped 4, Stored 8');
+  check(await address() === '#/upload', 'a drop on the list does not lead to the upload');
+  await shoot('upload');
+}
+
+/** What does not get through, and what somebody breaks off, is sent when it is asked for again. */
+async function walkUploadFaults() {
+  await page.setOfflineMode(true);
+  await choose('1.dcm', '2.dcm');
+  await uploaded('files without a network', 'Refused 2, Not sent 2, Skipped 4, Stored 8');
+  check((await text('.is-unsent .told')).includes('cannot be reached'), 'it is not told that the server cannot be reached');
+  await page.setOfflineMode(false);
+  await press('Send again');
+  await uploaded('what was sent again', 'Refused 2, Skipped 4, Stored 10');
+  await page.emulateNetworkConditions({ upload: 2000, download: 1e7, latency: 0 });
+  await choose('1.dcm', '2.dcm', '3.dcm');
+  await present('.upload-line');
+  await until('the beginning', () => document.querySelector('.outcome-count.is-sending') !== null);
+  await shoot('upload-busy');
+  await press('Cancel');
+  await uploaded('what is cancelled', 'Refused 2, Not sent 3, Skipped 4, Stored 10');
+  await page.emulateNetworkConditions(null);
+  await press('Send again');
+  await uploaded('what was cancelled', 'Refused 2, Skipped 4, Stored 13');
+  await press('Clear');
+  await until('an empty list', () => document.querySelector('.upload-panel').hidden);
+}
+
+async function imagesThere() {
+  const answer = await fetch(`${root}/dicom-web/studies?includefield=NumberOfStudyRelatedInstances`);
+  return (await answer.json()).reduce((sum, one) => sum + one['00201208'].Value[0], 0);
+}
+
+/** Whatever a page of another origin can have a browser send, nothing is stored by it. */
+async function walkForged() {
+  const before = await imagesThere();
+  const other = await browser.newPage();
+  await other.goto('data:text/html,<form method=post enctype=multipart/form-data><input name=a value=b></form>');
+  const object = readFileSync(join(uploads, '..', 'forged.dcm')).toString('base64');
+  await other.evaluate(async (target, base64) => {
+    const bytes = Uint8Array.from(atob(base64), (one) => one.charCodeAt(0));
+    for (const type of ['application/dicom', 'text/plain', 'multipart/form-data; boundary=a'])
+      for (const mode of ['cors', 'no-cors']) await fetch(target, { method: 'POST', mode, credentials: 'include', headers: { 'Content-Type': type }, body: bytes }).catch(() => null);
+    navigator.sendBeacon(target, new Blob([bytes], { type: 'text/plain' }));
+    await new Promise((done) => { Object.assign(new Image(), { onload: done, onerror: done, src: target }); });
+  }, `${root}/dicom-web/studies`, object);
+  const [answer] = await Promise.all([other.waitForNavigation(), other.$eval('form', (form, target) => { form.action = target; form.submit(); }, `${root}/dicom-web/studies`)]);
+  check(answer.status() === 403, `a form of another page is answered by ${answer.status()}`);
+  await other.close();
+  check(await imagesThere() === before, 'a page of another origin stored something');
+}
+
 async function walkOffline() {
   await page.goto(`${root}/#/`);
   await present('.study');
@@ -253,7 +347,8 @@ async function walkOffline() {
 /** What Chromium says of an answer that the walk expects to fail is no fault of the page. */
 function isExpected(fault) {
   return fault.startsWith('console: Failed to load resource') &&
-    (fault.includes('/browser/studies/1.2.3.4.5.6.7.8.9') || fault.includes('/corrections?preview=true') || fault.includes('ERR_INTERNET_DISCONNECTED'));
+    (fault.includes('/browser/studies/1.2.3.4.5.6.7.8.9') || fault.includes('/corrections?preview=true') ||
+      fault.endsWith('/dicom-web/studies') || fault.includes('ERR_INTERNET_DISCONNECTED'));
 }
 
 try {
@@ -263,6 +358,9 @@ try {
   await walkSides();
   await walkHostile();
   await walkDelete(await walkCorrect());
+  await walkUpload();
+  await walkUploadFaults();
+  await walkForged();
   await walkOffline();
 } catch (error) {
   faults.push(String(error));

@@ -25,5 +25,22 @@ cat >"$folder/job.xml" <<'XML'
 XML
 "$kdd" --quiet qa "$folder/job.xml" --study "$study" --image "$image"
 
-serve --corrections --deletions
-node "$here/page.mjs" "$root" "$pictures"
+# To be uploaded: three images and one that is cut, what is no object, and a folder with two more.
+"$kdd" --quiet sample "$folder/more" --images 60 --seed 9
+mkdir -p "$folder/uploads/below"
+find "$folder/more" -name '*.dcm' -path '*/CT-1/*' | sort >"$folder/found"
+for i in 1 2 3 4 5 6; do
+    into=$folder/uploads
+    [ "$i" -le 4 ] || into=$folder/uploads/below
+    cp "$(sed -n "${i}p" "$folder/found")" "$into/$i.dcm"
+done
+truncate -s 3000 "$folder/uploads/4.dcm"
+cp "$(sed -n 7p "$folder/found")" "$folder/forged.dcm"
+echo "no image" >"$folder/uploads/<b>read-me<b>.txt"
+{
+    head -c 128 /dev/zero
+    printf 'DICM\x02\x00\x02\x00UI\x14\x001.2.840.10008.1.3.10'
+} >"$folder/uploads/DICOMDIR"
+
+KDD_FREE_SPACE=0 serve --stow --corrections --deletions
+node "$here/page.mjs" "$root" "$folder/uploads" "$pictures"

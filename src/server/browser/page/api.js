@@ -13,11 +13,13 @@ export class Failure extends Error {
 const kinds = { 404: 'absent', 410: 'absent', 503: 'busy' };
 const longestReason = 300;
 
+/** What the body of an answer says of why there is no other. */
+export function reasonIn(status, type, body) {
+  return (type.startsWith('text/plain') && body.trim().slice(0, longestReason)) || `The server answered ${status}.`;
+}
+
 export async function reasonOf(response) {
-  const type = response.headers.get('Content-Type') ?? '';
-  if (!type.startsWith('text/plain')) return `The server answered ${response.status}.`;
-  const text = await response.text();
-  return text.trim().slice(0, longestReason) || `The server answered ${response.status}.`;
+  return reasonIn(response.status, response.headers.get('Content-Type') ?? '', await response.text());
 }
 
 async function ask(address, accept, signal) {

@@ -1,6 +1,7 @@
 // Finds the view for the page's address and puts it in place.
 //
 //   #/?name=doe&modality=CT                 studies that fit
+//   #/upload                                for those who may
 //   #/studies/1.2                           a study
 //   #/studies/1.2/volumes, /corrections
 //   #/studies/1.2/correct, /delete          for those who may
@@ -11,6 +12,7 @@ import { config, Failure, readConfig } from './api.js';
 import { h, state } from './dom.js';
 import { isTyping } from './keys.js';
 import { listView } from './list.js';
+import { may } from './change-api.js';
 import { correctView } from './correct.js';
 import { correctionsView } from './corrections.js';
 import { differenceView } from './difference.js';
@@ -18,10 +20,12 @@ import { imageView } from './image.js';
 import { removeView } from './remove.js';
 import { returnToPlace } from './session.js';
 import { studyView } from './study.js';
+import { takeDrops, uploadView } from './upload.js';
 import { volumesView } from './volumes.js';
 
 const views = [
   [/^\/?$/, listView],
+  [/^\/upload$/, uploadView],
   [/^\/studies\/([^/]+)$/, studyView],
   [/^\/studies\/([^/]+)\/volumes$/, volumesView],
   [/^\/studies\/([^/]+)\/corrections$/, correctionsView],
@@ -128,4 +132,5 @@ offline.hidden = navigator.onLine;
 // Without it the page is whole but for links to what else the server has.
 returnToPlace();
 await readConfig().catch(() => config);
+if (may('store')) takeDrops();
 show();

@@ -1,10 +1,13 @@
 // The list of studies, searched while one types.
 
 import { addresses, config, Failure, searchStudies } from './api.js';
+import { may } from './change-api.js';
 import { announce, h, icon, picture, state, waiting } from './dom.js';
 import { age, amount, date, first, personName, sexes, time, values } from './format.js';
 import { hints, isTyping, roving, vertical } from './keys.js';
 import { signOut } from './session.js';
+import { follow, uploadLink } from './upload.js';
+import { isBusy, queue } from './upload-queue.js';
 
 const pageSize = 50;
 const pause = 220; // [ms] without a key before the server is asked
@@ -13,7 +16,7 @@ const modalities = ['CR', 'CT', 'DOC', 'DX', 'ECG', 'ES', 'IO', 'IVUS', 'KO', 'M
 const terms = ['name', 'id', 'accession', 'from', 'to', 'modality'];
 
 // Where one was in the list, to come back there.
-const last = { query: '', studies: [], isWhole: false, uid: '', scroll: 0 };
+const last = { query: '', studies: [], isWhole: false, uploads: 0, uid: '', scroll: 0 };
 
 function input(name, properties) {
   return h('input', { id: `by-${name}`, name, class: 'input', autocomplete: 'off', spellcheck: 'false', ...properties });
@@ -141,6 +144,7 @@ class StudyList {
     const query = this.query();
     this.asking?.abort();
     this.asking = new AbortController();
+    last.uploads = queue.arrived;
     const shapes = waiting(Array(8).fill(52));
     if (!this.list.isConnected) this.results.replaceChildren(shapes);
     this.results.setAttribute('aria-busy', 'true');
@@ -211,6 +215,7 @@ export function listView(view, query) {
   const list = new StudyList(view, query);
   view.replace(h('header', { class: 'top' }, h('a', { class: 'home', href: '#/' },
     h('img', { src: 'page/icon.svg', alt: '', width: 24, height: 24 }), h('h1', {}, 'Studies')),
+  may('store') && uploadLink(view),
   config.signIn && h('button', { class: 'button leave', type: 'button', onclick: signOut }, 'Sign out')),
   h('div', { class: 'search' }, list.form), list.count, list.results,
   hints(h, [[['/'], 'search'], [['↓', '↑'], 'move'], [['Enter'], 'open'], [['Esc'], 'clear']]));
@@ -223,14 +228,16 @@ export function listView(view, query) {
     list.find();
     return true;
   };
-  // Back from a study: the list as it was, at once, and what is new meanwhile afterwards.
-  if (last.uid && last.query === list.query().toString() && last.studies.length > 0) {
+  // Back from a study: the list as it was, at once, unless there is more by now.
+  if (last.uid && last.uploads === queue.arrived && last.query === list.query().toString() && last.studies.length > 0) {
     view.keepsPlace = true;
     list.show();
     const opened = list.list.querySelector(`[data-uid="${CSS.escape(last.uid)}"]`);
     opened?.focus({ preventScroll: true });
     scrollTo(0, last.scroll);
-    return;
+  } else {
+    list.find();
   }
-  list.find();
+  // What is brought in meanwhile shows as soon as all of it is there.
+  follow(view, () => { if (!isBusy() && last.uploads !== queue.arrived) list.find(); });
 }

@@ -3,11 +3,8 @@
 #include "server/dicomweb/change/ObjectName.h"
 
 #include <QHash>
-#include <QJsonArray>
 #include <QJsonDocument>
 #include <QJsonObject>
-
-#include <kddlib/QAData.h>
 
 #include <vector>
 
@@ -77,11 +74,19 @@ private:
 
 }  // namespace
 
-QByteArray correctionReport(const QAData& job, const QByteArray& root, bool isPreview)
+bool tellChanges(const QAData::Outcome& outcome, QJsonArray& changes)
 {
     Groups groups;
-    for (const QAImageOutcome& image : job.outcome.images)
+    for (const QAImageOutcome& image : outcome.images)
         groups.add(image);
+    changes = groups.json();
+    return groups.isComplete();
+}
+
+QByteArray correctionReport(const QAData& job, const QByteArray& root, bool isPreview)
+{
+    QJsonArray changes;
+    const bool isComplete = tellChanges(job.outcome, changes);
     QJsonArray notFound;
     for (const QByteArray& key : job.outcome.notFound)
         notFound.append(QString::fromLatin1(publicKey(key)));
@@ -94,8 +99,8 @@ QByteArray correctionReport(const QAData& job, const QByteArray& root, bool isPr
         {QStringLiteral("changed"), job.outcome.changed},
         {QStringLiteral("moved"), job.outcome.moved},
         {QStringLiteral("notFound"), notFound},
-        {QStringLiteral("changes"), groups.json()},
-        {QStringLiteral("complete"), groups.isComplete()}};
+        {QStringLiteral("changes"), changes},
+        {QStringLiteral("complete"), isComplete}};
     if (!job.oldStudyUID.isEmpty())
         report.insert(QStringLiteral("oldStudy"), QString::fromLatin1(job.oldStudyUID));
     return QJsonDocument(report).toJson(QJsonDocument::Compact);

@@ -1,16 +1,15 @@
 #pragma once
 
 #include <QByteArray>
+#include <QJsonArray>
 
-namespace Kdd
-{
-
-struct QAData;
-
-}  // namespace Kdd
+#include <kddlib/QAData.h>
 
 namespace Kdd::DicomWeb
 {
+
+/// What a correction changed, or would change, as "changes" below has it. False: there is more than that.
+bool tellChanges(const QAData::Outcome& outcome, QJsonArray& changes);
 
 /// What a correction did, or would do, as JSON. Images of which the same is told share one entry:
 ///
