@@ -13,15 +13,13 @@ import gzip
 import http.client
 import json
 import os
-import shutil
 import socket
 import statistics
 import sys
-import tempfile
 import threading
 import time
 
-from servers import ImageTemplate, ct_slices, start_kdd, start_peer
+from servers import ImageTemplate, comparison, ct_slices, start_kdd, start_peer
 
 SIDE = 512  # rows and columns
 BOUNDARY = b"a-boundary-of-the-benchmark"
@@ -137,9 +135,7 @@ def main():
         sys.exit(__doc__)
     kdd = os.path.abspath(os.path.join(sys.argv[1], "src/tools/kdd/kdd"))
     count = numbers(2, [1000])[0]
-    folder = tempfile.mkdtemp(prefix="kdd-arrivals-", dir=os.environ.get("KDD_BENCH_FOLDER"))
-    servers = []
-    try:
+    with comparison("arrivals", os.environ.get("KDD_BENCH_FOLDER")) as (folder, servers):
         template = ImageTemplate(ct_slices(kdd, folder)[0], SIDE)
         servers.append(start_kdd(kdd, folder, options=["--stow"], env={"KDD_FREE_SPACE": "0"}))
         peer = start_peer(folder)
@@ -161,11 +157,6 @@ def main():
                         "" if found is first else "%.1f" % (first["rate"] / found["rate"]),
                         found["counted"], found["whole"], found["cpu"], found["missing"]), flush=True)
         print("One wait for the disk: %.1f ms" % disk_wait(folder))
-        print("Largest memory, MiB: " + ", ".join("%s %.0f" % (each.name, each.memory()) for each in servers))
-    finally:
-        for server in servers:
-            server.stop()
-        shutil.rmtree(folder)
 
 
 if __name__ == "__main__":

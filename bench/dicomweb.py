@@ -18,10 +18,9 @@ import statistics
 import struct
 import subprocess
 import sys
-import tempfile
 import time
 
-from servers import changed, ct_slices, noise, start_kdd, start_peer
+from servers import add, changed, comparison, ct_slices, noise, start_kdd, start_peer
 
 STUDY = "1.2.826.0.1.3680043.2.1143.1"
 SERIES = (STUDY + ".1", STUDY + ".2")
@@ -158,12 +157,9 @@ def main():
         sys.exit(__doc__)
     kdd = os.path.abspath(os.path.join(sys.argv[1], "src/tools/kdd/kdd"))
     seconds = float(sys.argv[2]) if len(sys.argv) > 2 else 3
-    folder = tempfile.mkdtemp(prefix="kdd-dicomweb-")
-    servers = []
-    try:
+    with comparison("dicomweb") as (folder, servers):
         files = make_archive(kdd, folder)
-        subprocess.run([kdd, "--quiet", "add", files], check=True,
-                       env={**os.environ, "KDD_STORE": os.path.join(folder, "store")})
+        add(kdd, folder, files)
         kept = start_kdd(kdd, folder)
         servers.append(kept)
         unkept = start_kdd(kdd, folder, "kdd, nothing kept", env={"KDD_ANSWERS_SIZE": "0"})
@@ -190,11 +186,6 @@ def main():
                 rates = ["%.1f" % each for each in found["rates"]] or ["", ""]
                 print("| %s | %s | %d | %.2f | %.3f | %s |" % (row["name"], server.name, found["bytes"], found["wall"],
                                                                found["cpu"], " | ".join(rates + ratios)), flush=True)
-        print("\nLargest memory, MiB: " + ", ".join("%s %.0f" % (each.name, each.memory()) for each in servers))
-    finally:
-        for server in servers:
-            server.stop()
-        shutil.rmtree(folder)
 
 
 if __name__ == "__main__":

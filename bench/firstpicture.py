@@ -8,13 +8,12 @@ browser of its own that has nothing from an earlier one; the table has the media
 """
 import json
 import os
-import shutil
 import statistics
 import subprocess
 import sys
-import tempfile
 
-from dicomweb import STUDY, Server, free_port, make_archive, start_kdd, start_peer
+from dicomweb import STUDY, make_archive
+from servers import Server, add, comparison, free_port, start_kdd, start_peer
 
 
 def start_front(folder, viewer, server):
@@ -59,11 +58,10 @@ def main():
     kdd = os.path.abspath(os.path.join(sys.argv[1], "src/tools/kdd/kdd"))
     viewer, modules = sys.argv[2], os.path.abspath(sys.argv[3])
     visits = int(sys.argv[4]) if len(sys.argv) > 4 else 5
-    folder = tempfile.mkdtemp(prefix="kdd-first-picture-")
-    servers = []
-    try:
+    with comparison("first-picture") as (folder, servers):
         files = make_archive(kdd, folder)
-        archives = [start_kdd(kdd, folder, files, True)]
+        add(kdd, folder, files)
+        archives = [start_kdd(kdd, folder)]
         servers += archives
         peer = start_peer(folder, files)
         if peer:
@@ -82,10 +80,6 @@ def main():
             medians = [statistics.median(each[row] for each in times) for row in rows]
             print("| %s | %s | %.0f |" % (server.name, " | ".join("%d" % each for each in medians),
                                           (server.cpu() - before) * 1000 / visits))
-    finally:
-        for server in reversed(servers):
-            server.stop()
-        shutil.rmtree(folder)
 
 
 if __name__ == "__main__":

@@ -104,6 +104,8 @@ def measure(build, store, address, database, requests):
 
 
 def main():
+    if len(sys.argv) < 2:
+        sys.exit(__doc__)
     build = os.path.abspath(sys.argv[1])
     requests = int(sys.argv[2]) if len(sys.argv) > 2 else 50
     kept = tempfile.TemporaryDirectory(prefix="kddsearches") if len(sys.argv) < 4 else None
@@ -122,4 +124,5 @@ def main():
         postgres.wait()
 
 
-main()
+if __name__ == "__main__":
+    main()

@@ -1,4 +1,5 @@
 """What the comparisons of servers have in common: made-up objects, and servers that are started, watched and stopped."""
+import contextlib
 import http.client
 import json
 import os
@@ -9,6 +10,7 @@ import socket
 import struct
 import subprocess
 import sys
+import tempfile
 import time
 
 TICKS = os.sysconf("SC_CLK_TCK")
@@ -158,6 +160,27 @@ class Server:
     def memory(self):
         with open("/proc/%d/status" % self.process.pid) as file:
             return int(re.search(r"VmHWM:\s+(\d+)", file.read()).group(1)) / 1024
+
+
+@contextlib.contextmanager
+def comparison(name, place=None):
+    """A folder of its own, and a list of the servers that work in it: they are stopped in the end, and it goes. Of one
+    that came to its end is told how much memory each took."""
+    folder = tempfile.mkdtemp(prefix="kdd-%s-" % name, dir=place)
+    servers = []
+    try:
+        yield folder, servers
+        print("\nLargest memory, MiB: " + ", ".join("%s %.0f" % (each.name, each.memory()) for each in servers))
+    finally:
+        for server in reversed(servers):
+            server.stop()
+        shutil.rmtree(folder)
+
+
+def add(kdd, folder, files):
+    """Takes what lies below a folder of files into the store that `start_kdd` serves."""
+    subprocess.run([kdd, "--quiet", "add", files], check=True,
+                   env={**os.environ, "KDD_STORE": os.path.join(folder, "store")})
 
 
 def start_kdd(kdd, folder, name="kdd", options=(), env=None):
