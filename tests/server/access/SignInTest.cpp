@@ -1,8 +1,12 @@
 #include "server/Server.h"
 #include "server/access/TestProvider.h"
 #include "server/http/Client.h"
+#include "support/DatasetBuilder.h"
+#include "support/FileContent.h"
 #include "support/LogCapture.h"
 #include "support/TemporaryStore.h"
+
+#include <QDir>
 
 #include <gtest/gtest.h>
 #include <kddlib/Kxg.h>
@@ -49,14 +53,16 @@ protected:
     }
 
     /// Keeps the cookies that the answer sets.
-    Reply ask(const QByteArray& method, const QByteArray& path, const QByteArray& headers = {})
+    Reply ask(const QByteArray& method, const QByteArray& path, const QByteArray& headers = {},
+              const QByteArray& body = {})
     {
         Client client(mServer->address());
         QByteArray cookies;
         for (auto each = mCookies.begin(); each != mCookies.end(); ++each)
             cookies += (cookies.isEmpty() ? "Cookie: " : "; ") + each.key() + '=' + each.value();
-        client.send(method + ' ' + path + " HTTP/1.1\r\nHost: localhost\r\nContent-Length: 0\r\n" + headers +
-                    (cookies.isEmpty() ? "" : cookies + "\r\n") + "\r\n");
+        client.send(method + ' ' + path +
+                    " HTTP/1.1\r\nHost: localhost\r\nContent-Length: " + QByteArray::number(body.size()) +
+                    "\r\n" + headers + (cookies.isEmpty() ? "" : cookies + "\r\n") + "\r\n" + body);
         const Reply reply = client.reply();
         for (const QByteArray& line : reply.head.split('\n')) {
             if (!line.startsWith("Set-Cookie: "))
@@ -219,8 +225,14 @@ TEST_F(SignInTest, LeadsNowhereElse)
 
 TEST_F(SignInTest, ChangesNothingForPagesOfOthers)
 {
+    mSettings.objects.emplace();
+    mSettings.objects->folder = mStore.filePath("objects").toUtf8();
+    mSettings.objects->freeBytes = 0;
     start();
     signIn();
+    const QString sent = mStore.filePath("sent.dcm");
+    DcmFileFormat object(&anImage("1.2.3.1").inStudy("1.2").dataset());
+    ASSERT_TRUE(object.saveFile(sent.toUtf8().constData(), EXS_LittleEndianExplicit).good());
     const struct
     {
         const char* headers;
@@ -231,14 +243,18 @@ TEST_F(SignInTest, ChangesNothingForPagesOfOthers)
         {"Origin: null\r\n", 403},
         {"Origin: https://evil.example\r\nX-Requested-With: a\r\nSec-Fetch-Site: same-origin\r\n", 403},
         {"Sec-Fetch-Site: same-site\r\nX-Requested-With: a\r\n", 403},
-        {"Sec-Fetch-Site: same-origin\r\n", 405},
-        {"X-Requested-With: fetch\r\n", 405},
-        {"Origin: http://localhost\r\n", 405},
+        {"Sec-Fetch-Site: same-origin\r\n", 200},
+        {"X-Requested-With: fetch\r\n", 200},
+        {"Origin: http://localhost\r\n", 200},
     };
     for (const auto& each : kOrigins) {
-        EXPECT_EQ(status("POST", "/dicom-web/studies", each.headers), each.status) << each.headers;
+        const QByteArray headers = QByteArray(each.headers) + "Content-Type: application/dicom\r\n";
+        EXPECT_EQ(ask("POST", "/dicom-web/studies", headers, fileContent(sent)).status, each.status)
+            << each.headers;
+        EXPECT_EQ(QDir(mStore.filePath("objects/1.2")).exists(), each.status == 200) << each.headers;
         EXPECT_EQ(status("GET", "/browser/config", each.headers), 200) << each.headers;
     }
+    EXPECT_TRUE(ask("GET", "/browser/config").body.contains(R"("may":["store"])"));
     EXPECT_EQ(status("POST", "/signout"), 403);
     EXPECT_EQ(status("GET", "/signout"), 405);
     EXPECT_EQ(mCookies.size(), 1);

@@ -331,6 +331,38 @@ TEST_F(StoreTest, TellsInXmlToWhomWantsThat)
     EXPECT_TRUE(reply.body.contains("<Value number=\"1\">1.2.3.1</Value>"));
 }
 
+TEST_F(StoreTest, ShowsInTheStudyBrowserAtOnceWhatHasArrived)
+{
+    start();
+    for (const char* image : {"1.2.3.1", "1.2.3.2"}) {
+        EXPECT_EQ(store(anImage(image)).status, 200);
+        Client client(mServer->address());
+        client.get("/browser/studies/1.2");
+        const Reply reply = client.reply();
+        EXPECT_EQ(reply.status, 200) << image;
+        EXPECT_TRUE(reply.body.contains(image[6] == '1' ? R"("images":1,)" : R"("images":2,)"))
+            << reply.body.constData();
+    }
+}
+
+TEST_F(StoreTest, TakesNothingFromPagesOfOtherOrigins)
+{
+    start();
+    const QByteArray body = partOf(fileOf(anImage("1.2.3.1"))) + "--cut--";
+    for (const char* headers :
+         {"Origin: https://evil.example\r\n", "Origin: null\r\n", "Origin: http://localhost:1\r\n",
+          "Origin: https://localhost\r\n", "Sec-Fetch-Site: cross-site\r\n", "Sec-Fetch-Site: same-site\r\n",
+          "Origin: https://evil.example\r\nSec-Fetch-Site: same-origin\r\n"})
+        EXPECT_EQ(post(body, "/studies", kType, headers).status, 403) << headers;
+    // All that a browser sends for a page without asking beforehand.
+    for (const char* type :
+         {"text/plain", "multipart/form-data; boundary=cut", "application/x-www-form-urlencoded", ""})
+        EXPECT_EQ(post(body, "/studies", type).status, 415) << type;
+    EXPECT_EQ(instances("1.2"), 0);
+    EXPECT_EQ(filesBelowObjects(), 0);
+    EXPECT_EQ(told(post(body, "/studies", kType, "Origin: http://localhost\r\n")), "200 1.2.3.1");
+}
+
 TEST_F(StoreTest, TakesNothingUnlessItIsToldTo)
 {
     mSettings.objects.reset();
