@@ -10,7 +10,8 @@ namespace
 /// What each modality of a study has along, in the index of its list.
 bool isOfModality(const QByteArray& column)
 {
-    return column == "study_id" || column == "uid" || column == "study_date" || column == "study_time";
+    return column == "study_id" || column == "uid" || column == "study_date" || column == "study_time" ||
+           column == "name_words";
 }
 
 }  // namespace
