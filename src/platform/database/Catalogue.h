@@ -365,8 +365,8 @@ public:
     /// The requests of a study that were left because files came that were not known before, and for nothing else.
     virtual Kdd::Result additions(const QByteArray& studyUID, QVector<qint64>& requests) = 0;
 
-    /// The files at or below a path that were removed and not registered again.
-    virtual Kdd::Result forgottenFiles(const QByteArray& path, QSet<QByteArray>& paths) = 0;
+    /// Takes out of `paths` what is known, and what was removed and not registered again.
+    virtual Kdd::Result dropKnown(QSet<QByteArray>& paths) = 0;
 
 protected:
     Catalogue() = default;

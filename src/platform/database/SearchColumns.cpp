@@ -7,49 +7,49 @@ Column columnOf(SearchColumn column)
 {
     switch (column) {
     case SearchColumn::StudyUID:
-        return {"s.uid", Where::Study, nullptr};
+        return {"uid", Where::Study, nullptr};
     case SearchColumn::StudyDate:
-        return {"s.study_date", Where::Study, nullptr};
+        return {"study_date", Where::Study, nullptr};
     case SearchColumn::StudyTime:
-        return {"s.study_time", Where::Study, nullptr};
+        return {"study_time", Where::Study, nullptr};
     case SearchColumn::AccessionNumber:
-        return {"s.accession_number", Where::Study, "accession_number"};
+        return {"accession_number", Where::Study, "accession_number"};
     case SearchColumn::ModalitiesInStudy:
-        return {"m.modality", Where::Study, nullptr};
+        return {"modality", Where::Modality, nullptr};
     case SearchColumn::ReferringPhysician:
         return {nullptr, Where::Words, "referring_physician"};
     case SearchColumn::PatientName:
-        return {"s.sort_name", Where::Words, "patient_name"};
+        return {"sort_name", Where::Words, "patient_name"};
     case SearchColumn::PatientID:
-        return {"s.patient_id", Where::Study, "patient_id"};
+        return {"patient_id", Where::Study, "patient_id"};
     case SearchColumn::PatientBirthDate:
-        return {"s.patient_birth_date", Where::Study, nullptr};
+        return {"patient_birth_date", Where::Study, nullptr};
     case SearchColumn::PatientSex:
-        return {"s.patient_sex", Where::Study, nullptr};
+        return {"patient_sex", Where::Study, nullptr};
     case SearchColumn::StudyID:
-        return {"s.study_code", Where::Study, "study_code"};
+        return {"study_code", Where::Study, "study_code"};
     case SearchColumn::StudyDescription:
         return {nullptr, Where::Words, "description"};
     case SearchColumn::SeriesUID:
-        return {"r.uid", Where::Series, nullptr};
+        return {"uid", Where::Series, nullptr};
     case SearchColumn::Modality:
-        return {"r.modality", Where::Series, nullptr};
+        return {"modality", Where::Series, nullptr};
     case SearchColumn::SeriesNumber:
-        return {"r.number_text", Where::Series, nullptr};
+        return {"number_text", Where::Series, nullptr};
     case SearchColumn::SeriesDescription:
-        return {"r.description", Where::Series, nullptr};
+        return {"description", Where::Series, nullptr};
     case SearchColumn::PerformedDate:
-        return {"r.performed_date", Where::Series, nullptr};
+        return {"performed_date", Where::Series, nullptr};
     case SearchColumn::PerformedTime:
-        return {"r.performed_time", Where::Series, nullptr};
+        return {"performed_time", Where::Series, nullptr};
     case SearchColumn::ScheduledStep:
-        return {"q.scheduled_step", Where::Request, nullptr};
+        return {"scheduled_step", Where::Request, nullptr};
     case SearchColumn::RequestedProcedure:
-        return {"q.requested_procedure", Where::Request, nullptr};
+        return {"requested_procedure", Where::Request, nullptr};
     case SearchColumn::SOPInstanceUID:
-        return {"f.sop_uid", Where::Series, nullptr};
+        return {"sop_uid", Where::Image, nullptr};
     }
-    return {"s.uid", Where::Study, nullptr};
+    return {"uid", Where::Study, nullptr};
 }
 
 }  // namespace Kxg

@@ -24,38 +24,32 @@ QVariantList textsOf(const StudyLimit& limit)
     return list;
 }
 
-SearchSql limitSql(const SqlDialect& dialect, const StudyLimit& limit)
+void addLimit(SearchSelection& selection, const SqlDialect& dialect, const StudyLimit& limit)
 {
     if (limit.values.isEmpty())
-        return {" AND 1 = 0", {}};
+        return selection.add({"1 = 0", {}});
     const int further = limit.values.size() - 1;
+    if (limit.of == StudyLimit::Of::Uid)
+        return selection.add(
+            {selection.study("uid") + " IN (?" + QByteArray(", ?").repeated(further) + ')', textsOf(limit)});
     const QByteArray holds = dialect.holds.arg(QLatin1String("l.attributes")).toLatin1();
     const QByteArray holdsOne = '(' + holds + (" OR " + holds).repeated(further) + ')';
-    const QByteArray ofStudy = " l WHERE l.study_id = s.study_id AND ";
-    switch (limit.of) {
-    case StudyLimit::Of::Uid:
-        return {" AND s.uid IN (?" + QByteArray(", ?").repeated(further) + ')', textsOf(limit)};
-    case StudyLimit::Of::Study:
-        return {" AND EXISTS (SELECT 1 FROM study_answer" + ofStudy + holdsOne + ')', linesOf(limit)};
-    case StudyLimit::Of::Series:
-        break;
-    }
+    const QByteArray ofStudy = " l WHERE l.study_id = " + selection.study("study_id") + " AND ";
+    if (limit.of == StudyLimit::Of::Study)
+        return selection.add(
+            {"EXISTS (SELECT 1 FROM study_answer" + ofStudy + holdsOne + ')', linesOf(limit)});
     const QByteArray series = "EXISTS (SELECT 1 FROM series_search" + ofStudy;
-    return {" AND " + series + holdsOne + ") AND NOT " + series + holds + " AND NOT " + holdsOne + ')',
-            linesOf(limit) + QVariantList{bytesValue(limit.attribute + '{')} + linesOf(limit)};
+    selection.add({series + holdsOne + ')', linesOf(limit)});
+    selection.add({"NOT " + series + holds + " AND NOT " + holdsOne + ')',
+                   QVariantList{bytesValue(limit.attribute + '{')} + linesOf(limit)});
 }
 
 }  // namespace
 
-SearchSql limitsSql(const SqlDialect& dialect, const StudyLimits& limits)
+void addLimits(SearchSelection& selection, const SqlDialect& dialect, const StudyLimits& limits)
 {
-    SearchSql all;
-    for (const StudyLimit& limit : limits.all) {
-        const SearchSql sql = limitSql(dialect, limit);
-        all.text += sql.text;
-        all.values += sql.values;
-    }
-    return all;
+    for (const StudyLimit& limit : limits.all)
+        addLimit(selection, dialect, limit);
 }
 
 }  // namespace Kxg

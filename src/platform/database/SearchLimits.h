@@ -1,11 +1,11 @@
 #pragma once
 
-#include "platform/database/SearchSql.h"
+#include "platform/database/SearchSelection.h"
 
 namespace Kxg
 {
 
-/// " AND ..." for studies that are named `s` outside.
-SearchSql limitsSql(const SqlDialect& dialect, const StudyLimits& limits);
+/// Leaves in the selection the studies that are within all of them.
+void addLimits(SearchSelection& selection, const SqlDialect& dialect, const StudyLimits& limits);
 
 }  // namespace Kxg

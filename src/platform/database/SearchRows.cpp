@@ -110,10 +110,11 @@ void put(SqlConnection& connection, qint64 studyId, const StudySearchRecord& stu
          textValue(words(study.description)), textValue(words(study.patientID)),
          textValue(words(study.accessionNumber)), textValue(words(study.studyID))});
     for (const QByteArray& modality : modalities)
-        connection.change("INSERT INTO study_modality (modality, study_date, study_time, uid, study_id)"
-                          " SELECT CAST(? AS TEXT), study_date, study_time, uid, study_id FROM study_search"
-                          " WHERE study_id = ?",
-                          {textValue(modality), studyId});
+        connection.change(
+            "INSERT INTO study_modality (modality, study_date, study_time, uid, study_id, name_words)"
+            " SELECT CAST(? AS TEXT), study_date, study_time, uid, study_id, name_words FROM study_search"
+            " WHERE study_id = ?",
+            {textValue(modality), studyId});
     for (const SeriesSearchRecord& series : study.series)
         putSeries(connection, studyId, series);
 }

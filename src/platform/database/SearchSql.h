@@ -9,11 +9,16 @@
 namespace Kxg
 {
 
-/// A question of a search, as the engine takes it.
+/// A question of a search or a condition of one, as the engine takes it.
 struct SearchSql
 {
     QByteArray text;
     QVariantList values;
+
+    bool isEmpty() const { return text.isEmpty(); }
+
+    /// Of conditions: another has to hold, too. An empty one is none.
+    void require(const SearchSql& condition);
 };
 
 /// Whether so many texts have what a pattern asks for that walking the list finds a page sooner than to find all of them;

@@ -12,20 +12,29 @@ namespace
 const char kColumns[] =
     "patient_name, referring_physician, description, patient_id, accession_number, study_code";
 
+// Names, which are asked for most, have an index wherever they are walked: the server then weighs the two.
+const char kModalityNames[] =
+    "CREATE INDEX study_modality_parts ON study_modality USING gin (name_words gin_trgm_ops)";
+
+QStringList textIndexes()
+{
+    QStringList columns;
+    for (const QString& column : QString::fromLatin1(kColumns).split(QStringLiteral(", ")).mid(1))
+        columns << column + QStringLiteral(" gin_trgm_ops");
+    return {QStringLiteral("CREATE EXTENSION IF NOT EXISTS pg_trgm"),
+            QStringLiteral("CREATE INDEX study_words_parts ON study_words USING gin (%1)")
+                .arg(columns.join(QStringLiteral(", "))),
+            QStringLiteral(
+                "CREATE INDEX study_search_parts ON study_search USING gin (name_words gin_trgm_ops)")};
+}
+
 // Whatever of it fails must leave the transaction around it whole.
-bool makePostgresIndex(SqlConnection& connection)
+bool makePostgresIndexes(SqlConnection& connection, const QStringList& statements)
 {
     connection.execute(QStringLiteral("SAVEPOINT words_index"));
     try {
-        connection.execute(QStringLiteral("CREATE EXTENSION IF NOT EXISTS pg_trgm"));
-        QStringList columns;
-        // Names, which are asked for most, have an index where they are walked, too: the server then weighs the two.
-        for (const QString& column : QString::fromLatin1(kColumns).split(QStringLiteral(", ")).mid(1))
-            columns << column + QStringLiteral(" gin_trgm_ops");
-        connection.execute(QStringLiteral("CREATE INDEX study_words_parts ON study_words USING gin (%1)")
-                               .arg(columns.join(QStringLiteral(", "))));
-        connection.execute(QStringLiteral(
-            "CREATE INDEX study_search_parts ON study_search USING gin (name_words gin_trgm_ops)"));
+        for (const QString& statement : statements)
+            connection.execute(statement);
         connection.execute(QStringLiteral("RELEASE SAVEPOINT words_index"));
         return true;
     } catch (const DatabaseError& error) {
@@ -35,6 +44,13 @@ bool makePostgresIndex(SqlConnection& connection)
             error.what());
         return false;
     }
+}
+
+bool hasPostgresIndexes(SqlConnection& connection)
+{
+    SqlRows rows = connection.ask("SELECT 1 FROM pg_indexes WHERE indexname = 'study_words_parts'"
+                                  " AND schemaname = current_schema()");
+    return rows.next();
 }
 
 /// Of the row that a trigger is called for.
@@ -57,7 +73,7 @@ void makeWordsTable(SqlConnection& connection)
         QStringLiteral("CREATE TABLE study_words (study_id %1 NOT NULL PRIMARY KEY, %2 %3 NOT NULL)")
             .arg(dialect.key, columns, dialect.text));
     if (!dialect.hasMatchIndex) {
-        makePostgresIndex(connection);
+        makePostgresIndexes(connection, textIndexes());
         return;
     }
     // The index knows the table and is told of each change of it. So texts are read without it, too, which is faster
@@ -91,29 +107,28 @@ void boundNames(SqlConnection& connection)
                                             " COLLATE \"C\" USING SUBSTR(name_words, 1, 1000)"));
 }
 
-void refineStatistics(SqlConnection& connection)
+void refineStatistics(SqlConnection& connection, const char* table)
 {
     if (connection.address().engine == DatabaseAddress::Engine::Sqlite)
         return;
     // The server guesses from a sample of names how many have a part. From the usual one it takes a part that one in a
     // hundred has for three times as frequent, and walks the list where the index finds them in a third of the time.
-    connection.execute(
-        QStringLiteral("ALTER TABLE study_search ALTER COLUMN name_words SET STATISTICS 1000"));
+    connection.execute(QStringLiteral("ALTER TABLE %1 ALTER COLUMN name_words SET STATISTICS 1000")
+                           .arg(QLatin1String(table)));
     // It would look at them of itself only after many changes.
-    connection.execute(QStringLiteral("ANALYZE study_search"));
+    connection.execute(QStringLiteral("ANALYZE %1").arg(QLatin1String(table)));
+}
+
+void indexModalityNames(SqlConnection& connection)
+{
+    if (connection.address().engine != DatabaseAddress::Engine::Sqlite && hasPostgresIndexes(connection))
+        makePostgresIndexes(connection, {QLatin1String(kModalityNames)});
 }
 
 bool obtainWordsIndex(SqlConnection& connection)
 {
-    if (connection.address().engine == DatabaseAddress::Engine::Sqlite)
-        return true;
-    {
-        SqlRows rows = connection.ask("SELECT 1 FROM pg_indexes WHERE indexname = 'study_words_parts'"
-                                      " AND schemaname = current_schema()");
-        if (rows.next())
-            return true;
-    }
-    return makePostgresIndex(connection);
+    return connection.address().engine == DatabaseAddress::Engine::Sqlite || hasPostgresIndexes(connection) ||
+           makePostgresIndexes(connection, textIndexes() << QLatin1String(kModalityNames));
 }
 
 }  // namespace Kxg

@@ -31,6 +31,8 @@ QByteArray withoutSlash(QByteArray path)
     return path;
 }
 
+constexpr int kPathsAtOnce = 200;
+
 /// One row for each series, the series of a study together.
 const char kListSeries[] =
     "SELECT study.id, study.uid, study.patient_name, study.patient_id, study.study_date,"
@@ -190,17 +192,24 @@ Kdd::Result SqlCatalogue::removeImage(const QByteArray& studyUID, const QByteArr
                        {textValue(sopUID), bytesValue(sopUID)});
 }
 
-Kdd::Result SqlCatalogue::forgottenFiles(const QByteArray& path, QSet<QByteArray>& paths)
+Kdd::Result SqlCatalogue::dropKnown(QSet<QByteArray>& paths)
 {
-    const QByteArray folder = withoutSlash(path);
+    static const QByteArray kOneOf = " WHERE path IN (?" + QByteArray(", ?").repeated(kPathsAtOnce - 1) + ')';
+    const QList<QByteArray> asked = paths.values();
     return transact(Access::Read, [&] {
-        QSet<QByteArray> found;
-        SqlRows rows = mConnection.ask("SELECT path FROM forgotten_file WHERE path = ? UNION ALL"
-                                       " SELECT path FROM forgotten_file WHERE path >= ? AND path < ?",
-                                       {bytesValue(folder), folder + '/', folder + '0'});
-        while (rows.next())
-            found.insert(rows.bytes(0));
-        paths.swap(found);
+        QSet<QByteArray> unknown = paths;
+        for (int from = 0; from < asked.size(); from += kPathsAtOnce) {
+            QVariantList values;
+            // The last portion is filled up, for the text of a statement stays the same.
+            for (int i = from; i < from + kPathsAtOnce; ++i)
+                values << bytesValue(asked.at(qMin(i, asked.size() - 1)));
+            SqlRows rows = mConnection.ask("SELECT path FROM file" + kOneOf +
+                                               " UNION ALL SELECT path FROM forgotten_file" + kOneOf,
+                                           values + values);
+            while (rows.next())
+                unknown.remove(rows.bytes(0));
+        }
+        paths.swap(unknown);
     });
 }
 

@@ -38,7 +38,7 @@ public:
                       IfAbsent ifAbsent) override;
     Kdd::Result claimRested(const QSet<int>& except, int restMs, std::unique_ptr<StudyClaim>& claim) override;
     Kdd::Result additions(const QByteArray& studyUID, QVector<qint64>& requests) override;
-    Kdd::Result forgottenFiles(const QByteArray& path, QSet<QByteArray>& paths) override;
+    Kdd::Result dropKnown(QSet<QByteArray>& paths) override;
     Kdd::Result finishRequests(const QVector<qint64>& requests) override;
 
     Kdd::Result setConfig(const QByteArray& section, const QByteArray& key, const QByteArray& value) override;

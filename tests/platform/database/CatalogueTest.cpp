@@ -91,6 +91,21 @@ TEST_P(CatalogueTest, AFileThatMovesTouchesBothStudiesAndAnEmptyOneWaitsToBeForg
     EXPECT_EQ(findStudies("1.1"), QVector<QByteArray>());
 }
 
+TEST_P(CatalogueTest, UnknownFilesAreThoseThatWereNeverThere)
+{
+    std::vector<DicomFileRecord> files;
+    QSet<QByteArray> paths{"/d/new", "/d/n%"};
+    for (int i = 0; i < 450; ++i) {
+        const QByteArray path = "/d/" + QByteArray::number(i);
+        files.push_back(dicom(path.constData(), "1", "1.1", path.constData()));
+        paths.insert(path);
+    }
+    add(files);
+    ASSERT_TRUE(catalogue().removeImage("1", "/d/7").good());
+    ASSERT_TRUE(catalogue().dropKnown(paths).good());
+    EXPECT_EQ(paths, (QSet<QByteArray>{"/d/new", "/d/n%"}));
+}
+
 TEST_P(CatalogueTest, ConflictsOfFilesAreTold)
 {
     EXPECT_EQ(conflictsOf({dicom("/d/z", "1", "1.1", "x"), dicom("/d/y", "2", "2.1", "x")}),

@@ -139,10 +139,11 @@ TEST_P(MigrationTest, AProgramThatRunsOnNeitherWritesNorReadsTablesItDoesNotKnow
 }
 
 /// With a name that no index of a server would take.
-TEST_P(MigrationTest, ADatabaseOfTheFifthSchemaGetsTheIndexOfNames)
+TEST_P(MigrationTest, ADatabaseOfTheFifthSchemaGetsTheIndexesOfNames)
 {
     DicomFileRecord file = dicom("/d/a", "1.2", "1.2.1", "x");
     file.patientName = "Doe^John";
+    file.modality = "CT";
     add({file});
     QByteArray name;
     for (quint32 i = 1; name.size() < 8000; i = i * 1664525 + 1013904223)
@@ -151,6 +152,9 @@ TEST_P(MigrationTest, ADatabaseOfTheFifthSchemaGetsTheIndexOfNames)
          {QByteArray("DROP INDEX study_search_by_date"),
           QByteArray(
               "CREATE INDEX study_search_by_date ON study_search (study_date DESC, study_time DESC, uid)"),
+          QByteArray("DROP INDEX study_modality_by_date"),
+          QByteArray("ALTER TABLE study_modality DROP COLUMN name_words"),
+          QByteArray("CREATE INDEX study_modality_by_date ON study_modality (modality, study_date DESC)"),
           "UPDATE study_search SET name_words = '" + name + "'"})
         execute(backwards.constData());
     if (GetParam() == Engine::Postgres)
@@ -160,14 +164,24 @@ TEST_P(MigrationTest, ADatabaseOfTheFifthSchemaGetsTheIndexOfNames)
     DatabaseAddress parsed;
     ASSERT_TRUE(DatabaseAddress::parse(address(), parsed).good());
     SqlConnection connection(parsed, SqlConnection::IfAbsent::Fail);
-    SqlRows rows = connection.askOnce(
-        GetParam() == Engine::Postgres ? "SELECT attstattarget FROM pg_attribute WHERE attname = 'name_words'"
-                                         " AND attrelid = 'study_search'::regclass"
-                                       : "SELECT 1000 FROM pragma_index_info('study_search_by_date')"
-                                         " WHERE name = 'name_words'",
-        {});
-    ASSERT_TRUE(rows.next());
-    EXPECT_EQ(rows.number(0), 1000);
+    const auto number = [&](const char* question) {
+        SqlRows rows = connection.askOnce(question, {});
+        return rows.next() ? rows.number(0) : -1;
+    };
+    for (const char* table : {"study_search", "study_modality"}) {
+        const QByteArray found =
+            GetParam() == Engine::Postgres
+                ? QByteArray("SELECT attstattarget FROM pg_attribute WHERE attname = 'name_words'"
+                             " AND attrelid = '") +
+                      table + "'::regclass"
+                : QByteArray("SELECT 1000 FROM pragma_index_info('") + table +
+                      "_by_date') WHERE name = 'name_words'";
+        EXPECT_EQ(number(found.constData()), 1000) << table;
+    }
+    EXPECT_EQ(number("SELECT LENGTH(m.name_words) FROM study_modality m JOIN study_search s"
+                     " ON s.study_id = m.study_id WHERE m.modality = 'CT'"
+                     " AND m.name_words = s.name_words AND m.uid = '1.2'"),
+              1000);
 }
 
 }  // namespace

@@ -1,134 +1,11 @@
-#include "platform/database/StudySearch.h"
-
-#include "DatabaseFixture.h"
-#include "platform/database/SearchText.h"
-#include "support/Threads.h"
-
-#include <atomic>
+#include "SearchFixture.h"
 
 using namespace Kxg;
 
 namespace
 {
 
-StudySearchRecord aStudy(const char* name, const char* date, const char* id,
-                         std::vector<const char*> modalities)
-{
-    StudySearchRecord study;
-    study.patientName = name;
-    study.date = date;
-    study.time = "100000.000000";
-    study.patientID = id;
-    study.attributes = "00100020{\"vr\":\"LO\"}\n";
-    int number = 0;
-    for (const char* modality : modalities) {
-        SeriesSearchRecord series;
-        series.uid = QByteArray(id) + '.' + QByteArray::number(++number);
-        series.modality = modality;
-        series.number = QByteArray::number(number);
-        series.instances = 10;
-        study.series.push_back(series);
-    }
-    return study;
-}
-
-SearchTerm oneOf(SearchColumn column, QVector<QByteArray> values)
-{
-    SearchTerm term;
-    term.column = column;
-    term.values = std::move(values);
-    return term;
-}
-
-SearchTerm like(SearchColumn column, const char* name)
-{
-    SearchTerm term;
-    term.column = column;
-    term.patterns = (column == SearchColumn::PatientName ? namePatterns(QString::fromUtf8(name))
-                                                         : textPatterns(QString::fromUtf8(name)))
-                        .patterns;
-    return term;
-}
-
-SearchTerm between(SearchColumn column, const char* from, const char* to, const char* fromTime = "",
-                   const char* toTime = "")
-{
-    SearchTerm term;
-    term.column = column;
-    term.from = from;
-    term.to = to;
-    term.fromTime = fromTime;
-    term.toTime = toTime;
-    return term;
-}
-
-class StudySearchTest : public DatabaseTest
-{
-protected:
-    void build(const char* uid, const StudySearchRecord& study, const char* digest = "d")
-    {
-        add({dicom(QByteArray("/d/" + QByteArray(uid)).constData(), uid, QByteArray(uid + QByteArray(".1")),
-                   uid)});
-        finish(uid, study, digest);
-    }
-
-    void finish(const char* uid, const StudySearchRecord& study, const char* digest)
-    {
-        std::unique_ptr<StudyClaim> claim;
-        ASSERT_EQ(catalogue().claim(uid, 0, claim, Catalogue::IfAbsent::Fail).text().toStdString(), "");
-        BuiltStudy built;
-        built.tagFile = {5, digest};
-        built.tagFile.modified = 7;
-        built.search = study;
-        ASSERT_EQ(claim->finish(built).text().toStdString(), "");
-    }
-
-    StudySearch& search()
-    {
-        Kdd::Result result;
-        if (!mSearch)
-            mSearch = StudySearch::open(address(), result);
-        EXPECT_EQ(result.text().toStdString(), "");
-        return *mSearch;
-    }
-
-    /// The UIDs that are found, in order.
-    std::string find(std::vector<SearchTerm> terms, std::vector<SearchOrder> order = {}, int limit = 100,
-                     int offset = 0)
-    {
-        SearchQuery query;
-        query.terms = std::move(terms);
-        query.order = std::move(order);
-        query.limit = limit;
-        query.offset = offset;
-        std::vector<FoundStudy> found;
-        EXPECT_EQ(search().studies(query, found).text().toStdString(), "");
-        int count = 0;
-        EXPECT_EQ(search().countStudies(query, 1000, count).text().toStdString(), "");
-        if (offset == 0 && limit == 100) {
-            EXPECT_EQ(count, static_cast<int>(found.size()));
-        }
-        QByteArray uids;
-        for (const FoundStudy& study : found)
-            uids += (uids.isEmpty() ? "" : " ") + study.uid;
-        return uids.toStdString();
-    }
-
-    std::string changes(qint64 after = 0)
-    {
-        std::vector<StudyChangeNote> noted;
-        qint64 last = 0;
-        EXPECT_EQ(search().changes(after, 100, noted, last).text().toStdString(), "");
-        QByteArray text;
-        for (const StudyChangeNote& each : noted)
-            text += QByteArray::number(each.position) + "ACMD"[static_cast<int>(each.kind) - 1] +
-                    each.studyInstanceUID + ' ';
-        return text.toStdString();
-    }
-
-private:
-    std::unique_ptr<StudySearch> mSearch;
-};
+using StudySearchTest = SearchTest;
 
 INSTANTIATE_TEST_SUITE_P(Engines, StudySearchTest, testing::Values(Engine::Sqlite, Engine::Postgres),
                          engineName);
@@ -256,24 +133,6 @@ TEST_P(StudySearchTest, FindsNothingBeyondItsLimits)
     EXPECT_EQ(find({}), "0 1 2 3 4");
 }
 
-TEST_P(StudySearchTest, GoesPastChangesThatMayNotBeSeen)
-{
-    for (const char* uid : {"1", "2", "3", "4"})
-        build(uid, aStudy("A", "20240101", uid, {"CT"}));
-    search().limitTo(
-        std::make_shared<StudyLimits>(StudyLimits{{{StudyLimit::Of::Uid, "0020000D", {"2", "3"}}}}));
-    std::vector<StudyChangeNote> noted;
-    qint64 last = 0;
-    for (const qint64 position : {2, 3}) {
-        ASSERT_TRUE(search().changes(last, 1, noted, last).good());
-        EXPECT_EQ(last, position);
-        EXPECT_EQ(noted.size(), 1U);
-    }
-    ASSERT_TRUE(search().changes(last, 1, noted, last).good());
-    EXPECT_EQ(last, 4);
-    EXPECT_EQ(noted.size(), 0U);
-}
-
 TEST_P(StudySearchTest, PagesFollowEachOtherInEveryOrder)
 {
     for (int i = 0; i < 9; ++i)
@@ -337,72 +196,6 @@ TEST_P(StudySearchTest, RegisteringMoreLeavesWhatIsBuiltAsItIsShown)
     build("1", aStudy("Shown", "20240101", "P1", {"CT"}));
     add({dicom("/d/more", "1", "1.9", "y")});
     EXPECT_EQ(find({like(SearchColumn::PatientName, "shown")}), "1");
-}
-
-TEST_P(StudySearchTest, ChangesAreTold)
-{
-    build("1", aStudy("A", "20240101", "P1", {"CT"}));
-    build("2", aStudy("A", "20240101", "P2", {"CT"}));
-    finish("1", aStudy("B", "20240101", "P1", {"CT"}), "e");
-    finish("1", aStudy("B", "20240101", "P1", {"CT"}), "e");  // the same bytes once more
-    finish("1", aStudy("B", "20240101", "P1", {"CT", "MR"}), "f");
-    finish("1", aStudy("B", "20240101", "P1", {"MR"}), "g");
-    ASSERT_TRUE(catalogue().removeStudy("2").good());
-    std::unique_ptr<StudyClaim> claim;
-    ASSERT_TRUE(catalogue().claim("2", 0, claim).good());
-    ASSERT_EQ(claim->finishRemoved().text().toStdString(), "");
-    EXPECT_EQ(changes(), "1A1 2A2 3C1 4A1 5D1 6D2 ");
-    EXPECT_EQ(changes(4), "5D1 6D2 ");
-    EXPECT_EQ(find({}), "1");
-}
-
-/// Whatever isolation a server is set up for.
-TEST_P(StudySearchTest, WhoFollowsTheChangesMissesNone)
-{
-    constexpr int kWriters = 4;
-    constexpr int kStudies = 10;
-    if (GetParam() == Engine::Postgres)
-        execute(("ALTER DATABASE " + address().mid(address().lastIndexOf("@/") + 2).split('?').front() +
-                 " SET default_transaction_isolation = 'repeatable read'")
-                    .constData());
-    catalogue();
-    std::atomic<int> writing{kWriters};
-    qint64 last = 0;
-    Kdd::onThreads(kWriters + 1, [&](int thread) {
-        Kdd::Result result;
-        const auto follower = StudySearch::open(address(), result);
-        const auto writer = open();
-        for (int i = 0; i < kStudies && thread < kWriters; ++i) {
-            const QByteArray uid = QByteArray::number(thread) + '.' + QByteArray::number(i);
-            QMap<QByteArray, qint64> requests;
-            EXPECT_TRUE(
-                writer
-                    ->registerFiles(
-                        {{dicom(uid.constData(), uid.constData(), uid.constData(), uid.constData())}, {}, {}},
-                        requests)
-                    .good());
-            std::unique_ptr<StudyClaim> claim;
-            EXPECT_TRUE(writer->claim(uid, 0, claim, Catalogue::IfAbsent::Fail).good());
-            BuiltStudy built;
-            built.tagFile = {5, uid};
-            built.search = aStudy("A", "20240101", "P", {"CT"});
-            EXPECT_EQ(claim->finish(built).text().toStdString(), "");
-        }
-        if (thread < kWriters) {
-            --writing;
-            return;
-        }
-        std::vector<StudyChangeNote> noted;
-        for (bool isLast = false; !isLast || !noted.empty();) {
-            isLast = writing == 0;  // asked before, so that the last look comes after the last change
-            qint64 position = last;
-            EXPECT_TRUE(follower->changes(last, 3, noted, position).good());
-            for (const StudyChangeNote& each : noted)
-                EXPECT_EQ(each.position, ++last);
-            EXPECT_EQ(position, last);
-        }
-    });
-    EXPECT_EQ(last, kWriters * kStudies);
 }
 
 TEST_P(StudySearchTest, OnlyOneRefreshesWhatSeveralFoundOld)

@@ -11,8 +11,6 @@
 #include "platform/os/FileStatus.h"
 #include "platform/os/PathName.h"
 
-#include <QSet>
-
 #include <algorithm>
 
 namespace Kdd
@@ -21,12 +19,9 @@ namespace Kdd
 namespace
 {
 
-constexpr char kTagFileSuffix[] = ".tc";
-
-bool isThere(const QByteArray& path)
+bool isAbsent(const QByteArray& path)
 {
-    FileStatus status;
-    return statusOf(path.constData(), status);
+    return presenceOf(pathText(path)) == FilePresence::Absent;
 }
 
 }  // namespace
@@ -34,52 +29,47 @@ bool isThere(const QByteArray& path)
 Result ArchiveRestoration::run(const QByteArray& objects, Totals& totals)
 {
     totals = {};
-    QList<QByteArray> unknown;
+    QSet<QByteArray> unknown;
     Result result = findObjects(absolutePath(objects), unknown);
     if (result.good())
         result = findNamed(unknown);
+    // Of several files of one image the one that is registered last is shown, so they need an order.
+    QList<QByteArray> files = unknown.values();
+    std::sort(files.begin(), files.end());
     if (result.good())
-        result = take(unknown, totals);
+        result = take(files, totals);
     return result.good() ? countAbsent(totals) : result;
 }
 
-/// An archive that never took any has no such folder.
-Result ArchiveRestoration::findObjects(const QByteArray& folder, QList<QByteArray>& unknown)
+Result ArchiveRestoration::findObjects(const QByteArray& folder, QSet<QByteArray>& unknown)
 {
-    if (!isThere(folder))
+    // An archive that never took any has no such folder.
+    if (isAbsent(folder))
         return {};
-    QHash<QByteArray, Kxg::FileStamp> known;
-    QSet<QByteArray> forgotten;
-    Result result = mCatalogue.knownFiles(folder, known);
-    if (result.good())
-        result = mCatalogue.forgottenFiles(folder, forgotten);
     QStringList faults;
     for (const QByteArray& file : filesBelow({folder}, faults)) {
         // What is just arriving, or was when its server died, is looked after by the next server.
-        const bool isArriving = file.startsWith(folder + "/.incoming/");
-        if (!isArriving && !known.contains(file) && !forgotten.contains(file))
-            unknown.append(file);
+        if (!file.startsWith(folder + "/.incoming/"))
+            unknown.insert(file);
     }
     for (const QString& fault : qAsConst(faults))
         LogFile::errorf("Could not look into %s", qUtf8Printable(fault));
-    return result;
+    return mCatalogue.dropKnown(unknown);
 }
 
 /// Of the files that tag files name which are not those that the database believes them to be.
-Result ArchiveRestoration::findNamed(QList<QByteArray>& unknown)
+Result ArchiveRestoration::findNamed(QSet<QByteArray>& unknown)
 {
-    QStringList faults;
-    const QByteArray folder = TagFile::metaFolder();
-    for (const QByteArray& path : isThere(folder) ? filesBelow({folder}, faults) : QList<QByteArray>()) {
+    for (const QString& path : tagFilesOfArchive()) {
         if (mObserver.isCancelled())
             return {};
         TagFile file;
         // One that cannot be read is built anew where the database knows its study.
-        if (!path.endsWith(kTagFileSuffix) || !file.readWhenFree(pathText(path), nullptr, false))
+        if (!file.readWhenFree(path, nullptr, false))
             continue;
         Kxg::StudyContents contents;
         Result result = mCatalogue.studyContents(file.studyInstanceUID(), contents);
-        if (result.good() && !isTagFile(pathText(path), contents.tagFile))
+        if (result.good() && !isTagFile(path, contents.tagFile))
             result = look(file, contents, unknown);
         if (result.bad())
             return result;
@@ -88,36 +78,20 @@ Result ArchiveRestoration::findNamed(QList<QByteArray>& unknown)
 }
 
 Result ArchiveRestoration::look(const TagFile& file, const Kxg::StudyContents& contents,
-                                QList<QByteArray>& unknown)
+                                QSet<QByteArray>& unknown)
 {
-    QSet<QByteArray> listed;
+    QSet<QByteArray> found;
+    for (const TagMap* image : file.imagesByUID())
+        found.insert(filePathOf(*image));
     for (const Kxg::ListedImage& image : contents.images)
-        listed.insert(image.path);
-    bool isAny = !listed.isEmpty();
-    for (const TagMap* image : file.imagesByUID()) {
-        const QByteArray path = filePathOf(*image);
-        bool isNew = false;
-        const Result result = listed.contains(path) ? Result() : isUnknown(path, isNew);
-        if (result.bad())
-            return result;
-        isAny = isAny || isNew;
-        if (isNew && !unknown.contains(path))
-            unknown.append(path);
-    }
+        found.remove(image.path);
+    Result result = mCatalogue.dropKnown(found);
+    for (auto it = found.begin(); it != found.end();)
+        it = isAbsent(*it) ? found.erase(it) : std::next(it);
     // Nothing is built of it, so that it stays as it is.
-    if (!isAny)
+    if (result.good() && contents.images.empty() && found.isEmpty())
         mForeign.append(file.studyInstanceUID());
-    return {};
-}
-
-Result ArchiveRestoration::isUnknown(const QByteArray& path, bool& isSo)
-{
-    QHash<QByteArray, Kxg::FileStamp> known;
-    QSet<QByteArray> forgotten;
-    Result result = mCatalogue.knownFiles(path, known);
-    if (result.good())
-        result = mCatalogue.forgottenFiles(path, forgotten);
-    isSo = known.isEmpty() && forgotten.isEmpty() && isThere(path);
+    unknown.unite(found);
     return result;
 }
 
@@ -153,7 +127,7 @@ Result ArchiveRestoration::countAbsent(Totals& totals)
         if (result.good())
             result = mCatalogue.studyContents(study.studyInstanceUID, contents);
         const auto absent = std::count_if(contents.images.begin(), contents.images.end(),
-                                          [](const Kxg::ListedImage& image) { return !isThere(image.path); });
+                                          [](const Kxg::ListedImage& image) { return isAbsent(image.path); });
         if (absent > 0)
             LogFile::warnf("Study %s: %d of %d files are not there; what its tag file has of them stays",
                            study.studyInstanceUID.constData(), static_cast<int>(absent),

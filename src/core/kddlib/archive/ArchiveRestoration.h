@@ -6,7 +6,7 @@
 
 #include <QByteArray>
 #include <QList>
-#include <QMap>
+#include <QSet>
 
 namespace Kxg
 {
@@ -47,10 +47,9 @@ public:
     Result run(const QByteArray& objects, Totals& totals);
 
 private:
-    Result findObjects(const QByteArray& folder, QList<QByteArray>& unknown);
-    Result findNamed(QList<QByteArray>& unknown);
-    Result look(const TagFile& file, const Kxg::StudyContents& contents, QList<QByteArray>& unknown);
-    Result isUnknown(const QByteArray& path, bool& isSo);
+    Result findObjects(const QByteArray& folder, QSet<QByteArray>& unknown);
+    Result findNamed(QSet<QByteArray>& unknown);
+    Result look(const TagFile& file, const Kxg::StudyContents& contents, QSet<QByteArray>& unknown);
     Result take(const QList<QByteArray>& files, Totals& totals);
     Result countAbsent(Totals& totals);
 

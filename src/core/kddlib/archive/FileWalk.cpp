@@ -1,5 +1,10 @@
 #include "kddlib/archive/FileWalk.h"
 
+#include "kddlib/tagfile/TagFileSettings.h"
+#include "platform/base/LogFile.h"
+#include "platform/os/FileStatus.h"
+#include "platform/os/PathName.h"
+
 #include <algorithm>
 #include <filesystem>
 #include <system_error>
@@ -78,6 +83,24 @@ QList<QByteArray> filesBelow(const QList<QByteArray>& paths, QStringList& faults
                 fault(place, error ? error : std::make_error_code(std::errc::no_such_file_or_directory)));
     }
     return files;
+}
+
+QStringList tagFilesOfArchive()
+{
+    const QString meta = pathText(TagFileSettings::metaFolder());
+    const QByteArray folder = absolutePath(TagFileSettings::metaFolder());
+    QStringList found;
+    if (presenceOf(meta) == FilePresence::Absent)
+        return found;
+    QStringList faults;
+    for (const QByteArray& file : filesBelow({folder}, faults)) {
+        if (file.endsWith(TagFileSettings::kSuffix))
+            found.append(meta + pathText(file.mid(folder.size() + 1)));
+    }
+    for (const QString& fault : qAsConst(faults))
+        LogFile::errorf("Could not look into %s", qUtf8Printable(fault));
+    found.sort();
+    return found;
 }
 
 }  // namespace Kdd

@@ -16,6 +16,10 @@ namespace Kdd
 /// up.
 KDD_EXPORT QList<QByteArray> filesBelow(const QList<QByteArray>& paths, QStringList& faults);
 
+/// The tag files below the meta folder, sorted and in the form in which a study's own is named. Folders that cannot be
+/// entered are told in the log; a meta folder that is not there has none.
+KDD_EXPORT QStringList tagFilesOfArchive();
+
 /// The path as `filesBelow` gives it.
 KDD_EXPORT QByteArray absolutePath(const QByteArray& path);
 

@@ -99,19 +99,8 @@ void StudyCheck::checkAll()
         known.insert(TagFile::cacheFilePathForStudy(study.studyInstanceUID.constData()));
     }
     // Tag files that no study of the database accounts for.
-    QStringList others;
-    QStringList faults;
-    const QString meta = pathText(TagFile::metaFolder());
-    const QByteArray folder = absolutePath(TagFile::metaFolder());
-    for (const QByteArray& file : filesBelow({folder}, faults)) {
-        // In the form in which the studies' own paths are noted, however the folder was named.
-        const QString path = meta + pathText(file.mid(folder.size() + 1));
-        if (file.endsWith(".tc") && !known.contains(path))
-            others.append(path);
-    }
-    others.sort();
-    for (const QString& path : qAsConst(others)) {
-        if (!mObserver.isCancelled())
+    for (const QString& path : tagFilesOfArchive()) {
+        if (!known.contains(path) && !mObserver.isCancelled())
             checkUnknown(path);
     }
 }

@@ -54,7 +54,7 @@ QString TagFileSettings::cacheFilePathForStudy(const char* studyUID)
     const QByteArray hash =
         QCryptographicHash::hash(QByteArray(studyUID) + '\n', QCryptographicHash::Md5).toHex();
     return pathText(metaFolder()) +
-           QString::fromLatin1(hash.left(2) + '/' + hash.mid(2, 2) + '/' + hash.mid(4) + ".tc");
+           QString::fromLatin1(hash.left(2) + '/' + hash.mid(2, 2) + '/' + hash.mid(4) + kSuffix);
 }
 
 }  // namespace Kdd

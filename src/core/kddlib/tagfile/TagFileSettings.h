@@ -41,6 +41,9 @@ public:
     static Durability durability() { return sDurability; }
     static void setDurability(Durability durability) { sDurability = durability; }
 
+    /// By what tag files are known among other files.
+    static constexpr char kSuffix[] = ".tc";
+
     /// The folder above all tag files; ends in "/". Until one is set it is what the site's settings say, else the image
     /// database, else "./". May be asked for on any thread.
     static const char* metaFolder();

@@ -42,11 +42,26 @@ protected:
     std::string shown()
     {
         std::string text;
-        for (const QJsonValue& each : list("studies?orderby=StudyInstanceUID"))
-            text += (textOf(each.toObject(), "0020000D") + QLatin1Char(' ') +
-                     textOf(each.toObject(), "00100010") + QLatin1Char(' ') +
-                     textOf(each.toObject(), "00201208") + QLatin1String("; "))
+        QMap<QString, QStringList> named;
+        for (const QJsonValue& each : list("studies?orderby=StudyInstanceUID")) {
+            const QString uid = textOf(each.toObject(), "0020000D");
+            const QString name = textOf(each.toObject(), "00100010");
+            named[name.left(2)] << uid;
+            text += (uid + QLatin1Char(' ') + name + QLatin1Char(' ') + textOf(each.toObject(), "00201208") +
+                     QLatin1String("; "))
                         .toStdString();
+        }
+        // What is known of studies in several places is the same everywhere.
+        for (auto it = named.cbegin(); it != named.cend(); ++it) {
+            const QByteArray begin = it.key().toUtf8();
+            for (const QByteArray& name : {begin + "*", "*" + begin.mid(1) + "*"}) {
+                const std::string both = studies(("ModalitiesInStudy=CT&PatientName=" + name).constData());
+                EXPECT_EQ(both, studies(("PatientName=" + name).constData()));
+                for (const QString& uid : *it)
+                    EXPECT_NE((' ' + both + ' ').find(' ' + uid.toStdString() + ' '), std::string::npos)
+                        << both;
+            }
+        }
         return text;
     }
 
