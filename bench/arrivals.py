@@ -4,15 +4,18 @@
     bench/arrivals.py BUILD-FOLDER [IMAGES] [CONNECTIONS,...] [OBJECTS-PER-REQUEST,...]
 
 A CT of 1,000 images of 512 x 512, a study of its own for each row, is sent over 1, 4 and 8 connections, one object in a
-request and 20. Told are objects per second, from the first byte to the last answer; the time from there until the
-study's count is right in a search and its metadata has all images; the server's processor time for each object, until
-then; and how many objects were not told as stored. Above the rows stands what one wait for the disk costs here, before
-and after: a server that tells of nothing before it is on the disk cannot be faster than its waits.
+request and 20. Told are objects per second, from the first byte to the last answer; the time from there until a search
+has answered with the right count and the metadata with all images; the server's processor time for each object, until
+then; and how many objects were not told as stored. A row of the disk follows: how many files of that size as many threads
+write a second that wait for as many of them at a time, and do nothing else. Before and after all rows stands what one wait
+for the disk costs: a server that tells of nothing before it is on the disk cannot be faster than its waits.
 """
 import gzip
 import http.client
+import itertools
 import json
 import os
+import shutil
 import socket
 import statistics
 import sys
@@ -64,15 +67,17 @@ class Sender(threading.Thread):
 
 
 def ask(server, path):
+    """The answer, and when it had come."""
     link = http.client.HTTPConnection("127.0.0.1", server.port, timeout=PATIENCE)
     link.request("GET", server.prefix + path, headers={"Accept": "application/dicom+json", "Accept-Encoding": "gzip"})
     answer = link.getresponse()
     body = answer.read()
+    moment = time.monotonic()
     if answer.status != 200:
-        return []
+        return [], moment
     if answer.getheader("Content-Encoding") == "gzip":
         body = gzip.decompress(body)
-    return json.loads(body)
+    return json.loads(body), moment
 
 
 def await_complete(server, study, count):
@@ -80,11 +85,13 @@ def await_complete(server, study, count):
     begin, counted = time.monotonic(), None
     while time.monotonic() - begin < PATIENCE:
         if counted is None:
-            found = ask(server, "/studies?includefield=00201208&StudyInstanceUID=" + study)
+            found, moment = ask(server, "/studies?includefield=00201208&StudyInstanceUID=" + study)
             if found and [int(each) for each in found[0].get("00201208", {}).get("Value", [])] == [count]:
-                counted = time.monotonic() - begin
-        if counted is not None and len(ask(server, "/studies/%s/metadata" % study)) == count:
-            return counted, time.monotonic() - begin
+                counted = moment - begin
+        if counted is not None:
+            found, moment = ask(server, "/studies/%s/metadata" % study)
+            if len(found) == count:
+                return counted, moment - begin
         time.sleep(0.02)
     return counted or float("inf"), float("inf")
 
@@ -126,6 +133,35 @@ def disk_wait(folder):
     return statistics.median(times) * 1000
 
 
+def disk_rate(folder, connections, batch, count):
+    """Files a second of half a MiB each that are written and waited for, by threads that have nothing else to do."""
+    names = iter(range(count))
+    place = os.path.join(folder, "disk")
+    os.mkdir(place)
+
+    def write():
+        while True:
+            files = []
+            for name in itertools.islice(names, batch):
+                files.append(os.open(os.path.join(place, str(name)), os.O_WRONLY | os.O_CREAT | os.O_EXCL))
+                os.write(files[-1], bytes(512 * 1024))
+            if not files:
+                return
+            for file in files:
+                os.fdatasync(file)
+                os.close(file)
+
+    threads = [threading.Thread(target=write) for _ in range(connections)]
+    start = time.monotonic()
+    for thread in threads:
+        thread.start()
+    for thread in threads:
+        thread.join()
+    wall = time.monotonic() - start
+    shutil.rmtree(place)
+    return count / wall
+
+
 def numbers(at, default):
     return [int(each) for each in sys.argv[at].split(",")] if len(sys.argv) > at else default
 
@@ -156,6 +192,8 @@ def main():
                         connections, batch, server.name, found["rate"],
                         "" if found is first else "%.1f" % (first["rate"] / found["rate"]),
                         found["counted"], found["whole"], found["cpu"], found["missing"]), flush=True)
+                disk = disk_rate(folder, connections, batch, min(count, 500))
+                print("| %d | %d | disk alone | %.0f | %.1f | | | | |" % (connections, batch, disk, first["rate"] / disk), flush=True)
         print("One wait for the disk: %.1f ms" % disk_wait(folder))
 
 

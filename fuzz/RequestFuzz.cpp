@@ -94,9 +94,9 @@ Requests requestsIn(const QByteArray& bytes, int piece)
         reader.add(bytes.constData() + at, std::min(piece, bytes.size() - at));
         for (bool goesOn = true; goesOn;) {
             if (state == Http::RequestReader::State::Headed) {
-                char block[100];
+                const char* block = nullptr;
                 int count = 0;
-                const auto read = reader.readBody(block, sizeof block, count);
+                const auto read = reader.readBody(block, count);
                 if (read == Http::RequestReader::Body::Malformed)
                     return {text, true};
                 body.append(block, count);

@@ -110,6 +110,9 @@ struct RegistrationOutcome
     /// tag file has to go.
     QMap<QByteArray, qint64> requests;
     std::vector<FileConflict> conflicts;
+
+    /// The paths of those that a correction has shown as something else than they say themselves.
+    QSet<QByteArray> corrected;
 };
 
 /// A correction of one stored image: what its study shows of it in place of what its DICOM file says. An image has one,

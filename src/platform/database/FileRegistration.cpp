@@ -125,6 +125,7 @@ void FileRegistration::followCorrections(std::vector<Entry>& entries)
         if (correction.shownImage != entry.path)
             entry.sopUID = correction.shownImage;
         entry.correctionId = found->id;
+        mOutcome->corrected.insert(entry.path);
     }
 }
 

@@ -14,13 +14,26 @@ constexpr int kLongestPreamble = 64 * 1024;
 constexpr int kLongestHeader = 16 * 1024;
 constexpr int kLongestPadding = 1024;
 
-int find(const QByteArray& text, const QByteArray& what, int from = 0)
+int find(const char* text, int size, const QByteArray& what)
 {
-    if (from >= text.size())
-        return -1;
-    const void* found = ::memmem(text.constData() + from, static_cast<std::size_t>(text.size() - from),
-                                 what.constData(), static_cast<std::size_t>(what.size()));
-    return found == nullptr ? -1 : static_cast<int>(static_cast<const char*>(found) - text.constData());
+    const void* found = ::memmem(text, static_cast<std::size_t>(size), what.constData(),
+                                 static_cast<std::size_t>(what.size()));
+    return found == nullptr ? -1 : static_cast<int>(static_cast<const char*>(found) - text);
+}
+
+int find(const QByteArray& text, const QByteArray& what)
+{
+    return find(text.constData(), text.size(), what);
+}
+
+/// How many bytes at the end are such as `what` begins with, and not all of it.
+int beginning(const char* text, int size, const QByteArray& what)
+{
+    int count = qMin(size, what.size() - 1);
+    while (count > 0 &&
+           std::memcmp(text + size - count, what.constData(), static_cast<std::size_t>(count)) != 0)
+        --count;
+    return count;
 }
 
 /// A header that goes on in the next line belongs together.
@@ -61,7 +74,9 @@ bool MultipartReader::add(const char* bytes, int size)
         return false;
     if (mState == State::Epilogue)
         return true;
-    mUnread.append(bytes, size);
+    // What is of a part and of nothing else is handed on where it lies.
+    const int passed = mState == State::Body && mUnread.isEmpty() ? passOn(bytes, size) : 0;
+    mUnread.append(bytes + passed, size - passed);
     while (advance()) {
     }
     return mState != State::Failed;
@@ -151,16 +166,21 @@ bool MultipartReader::readHeader()
 
 bool MultipartReader::readBody()
 {
-    const int at = find(mUnread, mDelimiter);
-    // Its beginning may be there, and its rest still on the way.
-    const int size = at >= 0 ? at : qMax(0, mUnread.size() - mDelimiter.size() + 1);
-    if (size > 0)
-        mReceiver.takePart(mUnread.constData(), size);
-    mUnread.remove(0, size);
-    if (at < 0)
-        return false;
-    mState = State::Delimiter;
-    return true;
+    const int passed = passOn(mUnread.constData(), mUnread.size());
+    mUnread.remove(0, passed);
+    return mState == State::Delimiter;
+}
+
+/// Hands on what is of the part, up to a delimiter or what may be the beginning of one, whose rest is on the way then.
+int MultipartReader::passOn(const char* bytes, int size)
+{
+    const int at = find(bytes, size, mDelimiter);
+    const int passed = at >= 0 ? at : size - beginning(bytes, size, mDelimiter);
+    if (passed > 0)
+        mReceiver.takePart(bytes, passed);
+    if (at >= 0)
+        mState = State::Delimiter;
+    return passed;
 }
 
 }  // namespace Kdd::Http

@@ -45,6 +45,7 @@ private:
     bool readDelimiter();
     bool readHeader();
     bool readBody();
+    int passOn(const char* bytes, int size);
 
     QByteArray mDelimiter;  // with the end of line that belongs to it
     Receiver& mReceiver;

@@ -55,6 +55,9 @@ int statusOf(const boost::beast::error_code& fault)
 /// asked about fewer once it has seen the zero, and no byte of a body has to be handed on before.
 constexpr int kShortestEnd = 5;
 
+/// So much of a body in chunks is taken out of them at once [bytes].
+constexpr int kBlock = 64 * 1024;
+
 /// "host:80", "[::1]": letters that cannot pass for another part of an address that it is put into.
 bool isHost(const QByteArray& text)
 {
@@ -69,10 +72,16 @@ bool isHost(const QByteArray& text)
 struct RequestReader::Private
 {
     boost::beast::error_code put();
+    void forgetHanded();
+    Body readPlain(const char*& bytes, int& count);
+    Body readChunks(const char*& bytes, int& count);
     bool awaitsLeave();
 
     QByteArray unread;
+    int handed = 0;  // of that, as bytes of a body
     std::optional<Parser> parser;
+    quint64 left = 0;           // of a body whose length was told
+    QByteArray unpacked;        // of one in chunks
     bool isUnderstood = false;  // the header, and what it says
     bool gaveLeave = false;
 };
@@ -85,6 +94,15 @@ boost::beast::error_code RequestReader::Private::put()
         boost::asio::const_buffer(unread.constData(), static_cast<std::size_t>(unread.size())), fault);
     unread.remove(0, static_cast<int>(used));
     return fault;
+}
+
+void RequestReader::Private::forgetHanded()
+{
+    if (handed == unread.size())
+        unread = QByteArray();
+    else
+        unread.remove(0, handed);
+    handed = 0;
 }
 
 /// True once.
@@ -106,7 +124,17 @@ RequestReader::~RequestReader() = default;
 
 void RequestReader::add(const char* bytes, int size)
 {
+    d->forgetHanded();
     d->unread.append(bytes, size);
+}
+
+void RequestReader::add(const QByteArray& bytes)
+{
+    d->forgetHanded();
+    if (d->unread.isEmpty())
+        d->unread = bytes;
+    else
+        d->unread.append(bytes);
 }
 
 RequestReader::State RequestReader::refuse(int status)
@@ -119,6 +147,7 @@ RequestReader::State RequestReader::advance()
 {
     if (mRefusal != 0)
         return State::Refused;
+    d->forgetHanded();
     if (!d->parser) {
         // Empty lines before a request are from clients that end a body with one.
         int blank = 0;
@@ -149,6 +178,7 @@ RequestReader::State RequestReader::advance()
         if (understood == State::Refused)
             return understood;
         d->isUnderstood = true;
+        d->left = d->parser->content_length().value_or(0);
         // Not before: fields behind a body would pass for those of the header, which others may have looked at on the way.
         d->parser->eager(true);
         if (mRequest.method == Method::Post)
@@ -163,10 +193,10 @@ RequestReader::State RequestReader::letGo()
     const auto length = d->parser->content_length();
     if (length && *length > static_cast<std::uint64_t>(mLimits.body))
         return refuse(413);
-    char block[4096];
     while (true) {
+        const char* bytes = nullptr;
         int count = 0;
-        switch (readBody(block, sizeof block, count)) {
+        switch (readBody(bytes, count)) {
         case Body::Block:
             mLetGo += count;
             if (mLetGo > mLimits.body)
@@ -184,28 +214,54 @@ RequestReader::State RequestReader::letGo()
     }
 }
 
-RequestReader::Body RequestReader::readBody(char* to, int size, int& count)
+RequestReader::Body RequestReader::readBody(const char*& bytes, int& count)
 {
     count = 0;
-    const int least = d->parser && d->parser->chunked() ? kShortestEnd : 1;
-    while (d->parser && !d->parser->is_done() && d->unread.size() >= least && count < size) {
-        auto& body = d->parser->get().body();
-        body.data = to + count;
-        body.size = static_cast<std::size_t>(size - count);
+    d->forgetHanded();
+    Body read = Body::End;
+    if (d->parser)
+        read = d->parser->chunked() ? d->readChunks(bytes, count) : d->readPlain(bytes, count);
+    // While it is waited for others may need the room.
+    if (read != Body::Block)
+        d->unpacked = QByteArray();
+    if (read == Body::Awaited && d->awaitsLeave())
+        return Body::AwaitsLeave;
+    if (read == Body::End)
+        d->parser.reset();
+    return read;
+}
+
+/// Where it lies: what the parser would say of it is known.
+RequestReader::Body RequestReader::Private::readPlain(const char*& bytes, int& count)
+{
+    if (left == 0)
+        return Body::End;
+    handed = static_cast<int>(std::min(left, static_cast<quint64>(unread.size())));
+    left -= static_cast<quint64>(handed);
+    bytes = unread.constData();
+    count = handed;
+    return count > 0 ? Body::Block : Body::Awaited;
+}
+
+RequestReader::Body RequestReader::Private::readChunks(const char*& bytes, int& count)
+{
+    unpacked.resize(kBlock);
+    while (!parser->is_done() && unread.size() >= kShortestEnd && count < kBlock) {
+        auto& body = parser->get().body();
+        body.data = unpacked.data() + count;
+        body.size = static_cast<std::size_t>(kBlock - count);
         body.more = true;
-        const boost::beast::error_code fault = d->put();
-        count = size - static_cast<int>(body.size);
+        const boost::beast::error_code fault = put();
+        count = kBlock - static_cast<int>(body.size);
         if (fault == http::error::need_more)
             break;
         if (fault && fault != http::error::need_buffer)
             return Body::Malformed;
     }
+    bytes = unpacked.constData();
     if (count > 0)
         return Body::Block;
-    if (d->parser && !d->parser->is_done())
-        return d->awaitsLeave() ? Body::AwaitsLeave : Body::Awaited;
-    d->parser.reset();
-    return Body::End;
+    return parser->is_done() ? Body::End : Body::Awaited;
 }
 
 /// Takes over what the header says.

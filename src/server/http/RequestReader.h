@@ -32,6 +32,9 @@ public:
 
     void add(const char* bytes, int size);
 
+    /// The same, without a copy where nothing else is unread.
+    void add(const QByteArray& bytes);
+
     /// Goes on with what is there.
     State advance();
 
@@ -50,8 +53,8 @@ public:
         Malformed,
     };
 
-    /// The next bytes of the body, until its end, of a request that is headed.
-    Body readBody(char* to, int size, int& count);
+    /// The next bytes of the body, until its end, of a request that is headed. They stay until the next call of anything.
+    Body readBody(const char*& bytes, int& count);
 
     // Of the request that was taken last.
 

@@ -81,13 +81,15 @@ void Session::receiveBody()
 /// On a receiver, for the sink may wait for disks. Nothing is read from the client before the sink has taken what was there.
 void Session::takeBody()
 {
-    QByteArray block(kBodyBlock, Qt::Uninitialized);
+    QByteArray block;
+    block.reserve(kBodyBlock);
     for (int i = 0; i < kBlocksPerTurn; ++i) {
+        const char* bytes = nullptr;
         int count = 0;
-        switch (mReader.readBody(block.data(), block.size(), count)) {
+        switch (mReader.readBody(bytes, count)) {
         case RequestReader::Body::Block:
             mBodyBytes += count;
-            if (!mSink->take(block.constData(), count)) {
+            if (!mSink->take(bytes, count)) {
                 endBody(mSink->answer(), Afterwards::Close);
                 return;
             }
@@ -105,9 +107,11 @@ void Session::takeBody()
         case RequestReader::Body::Awaited:
             break;
         }
+        block.resize(kBodyBlock);
         const Transport::Outcome outcome = mTransport->read(block.data(), block.size(), count);
         if (outcome == Transport::Outcome::Done) {
-            mReader.add(block.constData(), count);
+            block.resize(count);
+            mReader.add(block);
         } else if (outcome == Transport::Outcome::WantsRead) {
             pollfd socket = {mConnection->descriptor(), POLLIN, 0};
             if (::poll(&socket, 1, kMoment) > 0)

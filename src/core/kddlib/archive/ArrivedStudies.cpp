@@ -8,8 +8,6 @@
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
 
-#include <QSet>
-
 #include <algorithm>
 #include <condition_variable>
 #include <map>
@@ -48,6 +46,7 @@ struct Queued
 {
     std::vector<DicomInput> images;
     Result result;
+    QSet<QByteArray> corrected;
     bool isDone = false;
 };
 
@@ -139,6 +138,7 @@ Result ArrivedStudies::Private::registerQueued(Kxg::Catalogue& catalogue)
                 keep(image, registration);
         }
         each->result = result;
+        each->corrected = registration.corrected();
         each->isDone = true;
     }
     // What waits already is put off, and nobody has to be woken for that.
@@ -160,7 +160,8 @@ ArrivedStudies::ArrivedStudies(Pace pace)
 
 ArrivedStudies::~ArrivedStudies() = default;
 
-Result ArrivedStudies::add(std::vector<DicomInput> images, Kxg::Catalogue& catalogue)
+Result ArrivedStudies::add(std::vector<DicomInput> images, Kxg::Catalogue& catalogue,
+                           QSet<QByteArray>& corrected)
 {
     Queued entry;
     entry.images = std::move(images);
@@ -170,7 +171,9 @@ Result ArrivedStudies::add(std::vector<DicomInput> images, Kxg::Catalogue& catal
     }
     // While one registers the others wait here, and find that they were registered too or do it for all of them.
     const std::lock_guard<std::mutex> turn(d->registering);
-    return entry.isDone ? entry.result : d->registerQueued(catalogue);
+    const Result result = entry.isDone ? entry.result : d->registerQueued(catalogue);
+    corrected = std::move(entry.corrected);
+    return result;
 }
 
 void ArrivedStudies::addWaiting(const QByteArray& studyUID)

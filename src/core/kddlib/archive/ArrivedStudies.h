@@ -6,6 +6,7 @@
 
 #include <QByteArray>
 #include <QList>
+#include <QSet>
 
 #include <chrono>
 #include <memory>
@@ -41,8 +42,9 @@ public:
     /// What was not completed by then waits in the database's queue.
     ~ArrivedStudies();
 
-    /// Registers images. Success: they are registered for good.
-    Result add(std::vector<DicomInput> images, Kxg::Catalogue& catalogue);
+    /// Registers images. Success: they are registered for good, and `corrected` has the paths of those that a correction
+    /// shows as something else than they say; perhaps with others that were registered at the same time.
+    Result add(std::vector<DicomInput> images, Kxg::Catalogue& catalogue, QSet<QByteArray>& corrected);
 
     /// Of a study that waits for a reason that is not known here; it is due at once.
     void addWaiting(const QByteArray& studyUID);

@@ -147,6 +147,12 @@ DicomInput::~DicomInput() = default;
 
 DicomInput readDicomInput(const QByteArray& path, Damage damage)
 {
+    DcmFileFormat format;
+    return readDicomInput(path, damage, format);
+}
+
+DicomInput readDicomInput(const QByteArray& path, Damage damage, DcmFileFormat& format)
+{
     DicomInput input;
     input.path = path;
     FileStatus status;
@@ -166,7 +172,6 @@ DicomInput readDicomInput(const QByteArray& path, Damage damage)
     if (OrlanMesh::isVolumeFile(path))
         return std::move(takeVolume(input));
     const bool isDicom = hasDicomPrefix(file);
-    DcmFileFormat format;
     const OFCondition condition = damage == Damage::Refused
                                       ? readDicomFile(path.constData(), format)
                                       : readDamagedDicomFile(path.constData(), format, input.leftOut);

@@ -117,6 +117,7 @@ Result ObjectBatch::awaitFlushes()
 }
 
 /// After the files: as a rule the file system's journal went to the disk with these, and the names of the files with it.
+/// At the same time on another thread it would take longer where the processors are busy, which that thread needs first.
 Result ObjectBatch::flushFolders()
 {
     std::set<QByteArray> folders;
@@ -143,12 +144,14 @@ void ObjectBatch::registerPlaced(Result result)
         paths.push_back(entry->input.path);
         images.push_back(std::move(entry->input));
     }
+    QSet<QByteArray> corrected;
     if (result.good() && !images.empty())
-        result = mStudies.add(std::move(images), mCatalogue);
+        result = mStudies.add(std::move(images), mCatalogue, corrected);
     for (std::size_t i = 0; i < mPlaced.size(); ++i) {
         ArrivedObject& object = mPlaced[i]->object;
         if (result.good()) {
-            ObjectPlaces::tellShown(paths[i], mCatalogue, object);
+            if (corrected.contains(paths[i]))
+                ObjectPlaces::tellShown(paths[i], mCatalogue, object);
             continue;
         }
         // It may be registered all the same, when the answer was lost: the file stays, and so does its first name, from

@@ -47,7 +47,7 @@ bool isSameRest(const RandomAccessFile& one, qint64 at, const RandomAccessFile& 
 
 }  // namespace
 
-Result readMeta(const QByteArray& path, ObjectMeta& meta)
+Result findDataset(const QByteArray& path, qint64& offset)
 {
     RandomAccessFile file;
     const Result opened = file.open(path.constData());
@@ -60,17 +60,31 @@ Result readMeta(const QByteArray& path, ObjectMeta& meta)
     const char* length = begin + kPreamble + 4;
     if (std::memcmp(length, kMetaLength, sizeof kMetaLength) != 0)
         return Result::failure(QStringLiteral("Its meta information does not tell its length"));
-    meta.datasetOffset = kMetaBegin + qint64(qFromLittleEndian<quint32>(length + sizeof kMetaLength));
-    if (meta.datasetOffset >= file.size())
+    offset = kMetaBegin + qint64(qFromLittleEndian<quint32>(length + sizeof kMetaLength));
+    if (offset >= file.size())
         return Result::failure(QStringLiteral("It ends within its meta information"));
+    return {};
+}
+
+ObjectMeta metaOf(DcmFileFormat& file)
+{
+    DcmMetaInfo& meta = *file.getMetaInfo();
+    return {textOf(meta, DCM_MediaStorageSOPClassUID), textOf(meta, DCM_MediaStorageSOPInstanceUID),
+            textOf(meta, DCM_TransferSyntaxUID)};
+}
+
+Result readMeta(const QByteArray& path, ObjectMeta& meta)
+{
+    qint64 offset = 0;
+    const Result found = findDataset(path, offset);
+    if (found.bad())
+        return found;
     DcmFileFormat format;
     const OFCondition read =
         format.loadFile(path.constData(), EXS_Unknown, EGL_noChange, DCM_MaxReadLength, ERM_metaOnly);
     if (read.bad())
         return Result::failure(QString::fromLatin1(read.text()));
-    meta.sopClassUID = textOf(*format.getMetaInfo(), DCM_MediaStorageSOPClassUID);
-    meta.sopInstanceUID = textOf(*format.getMetaInfo(), DCM_MediaStorageSOPInstanceUID);
-    meta.transferSyntaxUID = textOf(*format.getMetaInfo(), DCM_TransferSyntaxUID);
+    meta = metaOf(format);
     return {};
 }
 
@@ -84,9 +98,11 @@ bool isSameObject(const QByteArray& path, const QByteArray& other)
         return true;
     ObjectMeta meta;
     ObjectMeta otherMeta;
+    qint64 offset = 0;
+    qint64 otherOffset = 0;
     return readMeta(path, meta).good() && readMeta(other, otherMeta).good() &&
-           meta.transferSyntaxUID == otherMeta.transferSyntaxUID &&
-           isSameRest(one, meta.datasetOffset, two, otherMeta.datasetOffset);
+           meta.transferSyntaxUID == otherMeta.transferSyntaxUID && findDataset(path, offset).good() &&
+           findDataset(other, otherOffset).good() && isSameRest(one, offset, two, otherOffset);
 }
 
 }  // namespace Kdd

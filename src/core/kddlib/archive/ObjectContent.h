@@ -4,6 +4,8 @@
 
 #include <QByteArray>
 
+class DcmFileFormat;
+
 namespace Kdd
 {
 
@@ -13,11 +15,17 @@ struct ObjectMeta
     QByteArray sopClassUID;
     QByteArray sopInstanceUID;
     QByteArray transferSyntaxUID;
-    qint64 datasetOffset = 0;  ///< of the first byte of the dataset
 };
 
-/// Failure: it is no DICOM file as they are exchanged, with preamble, prefix and meta information.
+/// Where the dataset of a file begins [bytes]. Failure: it is no DICOM file as they are exchanged, with preamble, prefix
+/// and meta information.
+Result findDataset(const QByteArray& path, qint64& offset);
+
+/// Failure: as above.
 Result readMeta(const QByteArray& path, ObjectMeta& meta);
+
+/// Of a file that was read already, as far as it could be.
+ObjectMeta metaOf(DcmFileFormat& file);
 
 /// Whether two files hold the same object: the same bytes, or the same dataset in the same transfer syntax, for senders
 /// write meta information of their own. False also when one cannot be read.

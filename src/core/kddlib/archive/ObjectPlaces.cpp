@@ -5,6 +5,7 @@
 #include "platform/os/FileStatus.h"
 
 #include <dcmtk/dcmdata/dcdeftag.h>
+#include <dcmtk/dcmdata/dcfilefo.h>
 
 #include <cerrno>
 
@@ -61,15 +62,17 @@ ArrivalFault faultOf(const SystemResult& result)
 
 bool ObjectPlaces::check(DicomInput& input, const QByteArray& studyUID, ArrivedObject& object)
 {
-    ObjectMeta meta;
-    const Result known = readMeta(input.path, meta);
-    object.sopClassUID = meta.sopClassUID;
-    object.sopInstanceUID = isName(meta.sopInstanceUID) ? meta.sopInstanceUID : QByteArray();
-    if (known.bad()) {
-        refuse(object, ArrivalFault::NotDicom, known.text());
+    qint64 offset = 0;
+    const Result found = findDataset(input.path, offset);
+    if (found.bad()) {
+        refuse(object, ArrivalFault::NotDicom, found.text());
         return false;
     }
-    input = readDicomInput(input.path, Damage::Refused);
+    DcmFileFormat file;
+    input = readDicomInput(input.path, Damage::Refused, file);
+    const ObjectMeta meta = metaOf(file);
+    object.sopClassUID = meta.sopClassUID;
+    object.sopInstanceUID = isName(meta.sopInstanceUID) ? meta.sopInstanceUID : QByteArray();
     if (input.kind != DicomInput::Kind::Image) {
         refuse(object, ArrivalFault::NotDicom,
                input.reason.isEmpty() ? QStringLiteral("It is no DICOM object") : input.reason);

@@ -254,7 +254,8 @@ Result ObjectStore::Private::takeIn(const QByteArray& place, Kxg::Catalogue& cat
         return result;
     LogFile::warnf("%s was stored by a server that ended before it told so; it is taken in now",
                    place.constData());
-    return studies.add(std::move(images), catalogue);
+    QSet<QByteArray> corrected;
+    return studies.add(std::move(images), catalogue, corrected);
 }
 
 }  // namespace Kdd

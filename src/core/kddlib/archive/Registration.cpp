@@ -68,6 +68,7 @@ Result Registration::flush()
     // By these requests the intake tells later whether anything else waits in a study.
     for (auto it = outcome.requests.cbegin(); it != outcome.requests.cend(); ++it)
         mRequests[it.key()].append(it.value());
+    mCorrected.unite(outcome.corrected);
     for (const Kxg::FileConflict& conflict : outcome.conflicts)
         warnOf(conflict);
     mImages += static_cast<int>(mBatch.dicom.size());

@@ -32,6 +32,9 @@ public:
     /// The requests that registering left for a study.
     QVector<qint64> requests(const QByteArray& studyUID) const { return mRequests.value(studyUID); }
 
+    /// The paths of registered files that a correction shows as something else than they say.
+    const QSet<QByteArray>& corrected() const { return mCorrected; }
+
     int images() const { return mImages; }
     int volumes() const { return mVolumes; }
 
@@ -39,6 +42,7 @@ private:
     Kxg::Catalogue& mCatalogue;
     Kxg::FileRecords mBatch;
     QHash<QByteArray, QVector<qint64>> mRequests;
+    QSet<QByteArray> mCorrected;
     int mImages = 0;
     int mVolumes = 0;
 };
