@@ -10,6 +10,7 @@ set(KDD_PUBLIC_HEADERS
   core/kddlib/archive/DicomInput.h
   core/kddlib/archive/FileScan.h
   core/kddlib/archive/FileWalk.h
+  core/kddlib/archive/ObjectCustody.h
   core/kddlib/archive/ObjectStore.h
   core/kddlib/archive/Registration.h
   core/kddlib/archive/StudyBuilders.h

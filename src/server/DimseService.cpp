@@ -1,5 +1,6 @@
 #include "server/DimseService.h"
 
+#include "server/dimse/CommitmentProvider.h"
 #include "server/dimse/EchoProvider.h"
 #include "server/dimse/FindProvider.h"
 #include "server/dimse/GetProvider.h"
@@ -13,17 +14,20 @@ namespace Kdd
 namespace
 {
 
-Dimse::Providers makeProviders(ServedArchive& archive, const Dimse::DimseSettings& settings)
+Dimse::Providers makeProviders(ServedArchive& archive, const Dimse::DimseSettings& settings,
+                               Dimse::CommitmentCourier& courier)
 {
-    const Dimse::RetrieveSource source = {archive.database, *archive.studies, *archive.objects};
+    const Dimse::RetrieveSource source = {archive.database, *archive.studies, *archive.objects,
+                                          archive.sight};
     Dimse::Providers providers;
     providers.push_back(std::make_shared<Dimse::EchoProvider>());
-    providers.push_back(
-        std::make_shared<Dimse::StoreProvider>(*archive.arrivals, settings.rules.takesUnknownClasses));
+    providers.push_back(std::make_shared<Dimse::StoreProvider>(*archive.arrivals, archive.sight,
+                                                               settings.rules.takesUnknownClasses));
     providers.push_back(std::make_shared<Dimse::FindProvider>(archive.database, *archive.studies,
                                                               ExResource::dicomAnswers()));
     providers.push_back(std::make_shared<Dimse::MoveProvider>(source, settings.tls, settings.patience));
     providers.push_back(std::make_shared<Dimse::GetProvider>(source));
+    providers.push_back(std::make_shared<Dimse::CommitmentProvider>(archive.sight, courier));
     return providers;
 }
 
@@ -45,13 +49,28 @@ std::unique_ptr<DimseService> DimseService::make(const Dimse::DimseSettings& set
                                                  ServedArchive& archive, Result& result)
 {
     result = checkReach(settings.address, isDecided);
-    std::unique_ptr<DimseService> made(new DimseService(audit));
+    std::unique_ptr<DimseService> made(new DimseService(settings, audit));
     if (result.good())
-        made->mListener =
-            Dimse::DimseListener::make(settings, makeProviders(archive, settings), made->mLog, result);
+        made->mListener = Dimse::DimseListener::make(
+            settings, makeProviders(archive, settings, *made->mCourier), made->mLog, result);
     if (result.good())
         result = made->mLog.check();
     return result.good() ? std::move(made) : nullptr;
+}
+
+DimseService::DimseService(const Dimse::DimseSettings& settings, const QByteArray& audit)
+    : mLog(audit)
+    , mRules(settings.rules)
+    , mHasCertificate(settings.tls.has_value())
+    , mCourier(std::make_unique<Dimse::CommitmentCourier>(mRules, settings.tls, settings.patience))
+{
+}
+
+/// What associations have left to be told is told by others, or not at all.
+void DimseService::stop()
+{
+    mListener->stop();
+    mCourier->stop();
 }
 
 void DimseService::addTo(Http::Metrics& metrics) const

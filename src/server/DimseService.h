@@ -2,6 +2,7 @@
 
 #include "server/DimseLog.h"
 #include "server/Resources.h"
+#include "server/dimse/CommitmentCourier.h"
 #include "server/dimse/DimseListener.h"
 
 namespace Kdd
@@ -18,7 +19,11 @@ public:
 
     /// On failure nothing has begun.
     Result start() { return mListener->start(); }
-    void stop() { mListener->stop(); }
+    void stop();
+
+    /// As Server has them.
+    bool hasCertificate() const { return mHasCertificate; }
+    Result renewCertificate() { return mListener->renewCertificate(); }
 
     Http::ListenAddress address() const { return mListener->address(); }
 
@@ -26,12 +31,12 @@ public:
     void addTo(Http::Metrics& metrics) const;
 
 private:
-    explicit DimseService(const QByteArray& audit)
-        : mLog(audit)
-    {
-    }
+    DimseService(const Dimse::DimseSettings& settings, const QByteArray& audit);
 
     DimseLog mLog;
+    const Dimse::AssociationRules mRules;
+    const bool mHasCertificate;
+    std::unique_ptr<Dimse::CommitmentCourier> mCourier;
     std::unique_ptr<Dimse::DimseListener> mListener;
 };
 

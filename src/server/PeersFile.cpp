@@ -1,6 +1,7 @@
 #include "server/PeersFile.h"
 
 #include "server/access/HostName.h"
+#include "server/dicomweb/search/StudyRule.h"
 #include "server/http/StrictJson.h"
 
 #include <QFile>
@@ -83,6 +84,23 @@ public:
         return rights;
     }
 
+    /// By attributes of studies, the values of which each has to have one.
+    std::shared_ptr<const Kxg::StudyLimits> limits(const char* name)
+    {
+        auto made = std::make_shared<Kxg::StudyLimits>();
+        const QJsonValue value = take(name);
+        const QJsonObject attributes = value.toObject();
+        for (auto each = attributes.begin(); each != attributes.end(); ++each) {
+            DicomWeb::StudyRule rule;
+            if (!DicomWeb::StudyRule::resolve(each.key().toUtf8(), rule))
+                fail(name, "has an attribute by which studies are not kept apart");
+            made->all.push_back(rule.limit(texts(name, each.value())));
+        }
+        if (attributes.isEmpty())
+            fail(name, "is no object with attributes, or empty");
+        return made;
+    }
+
     /// Numeric; a list, or one alone.
     QVector<QByteArray> addresses(const char* name)
     {
@@ -115,6 +133,20 @@ public:
     }
 
 private:
+    /// A list, or one alone.
+    QStringList texts(const char* name, const QJsonValue& value)
+    {
+        QStringList made;
+        for (const QJsonValue item : value.isArray() ? value.toArray() : QJsonArray{value}) {
+            made.append(item.toString());
+            if (made.last().isEmpty())
+                fail(name, "has a value that is no text, or empty");
+        }
+        if (made.isEmpty())
+            fail(name, "has an attribute without values");
+        return made;
+    }
+
     QJsonObject mObject;
     QString mName;
     Result& mResult;
@@ -141,6 +173,8 @@ Dimse::Peer readPeer(Section section)
         made.isSecure = section.flag("tls", false);
     }
     made.rights = section.rights("rights");
+    if (section.has("studies"))
+        made.studies = section.limits("studies");
     section.end();
     return made;
 }
@@ -184,6 +218,12 @@ Result PeersFile::parse(const QByteArray& text, PeersFile& file)
     if (whole.has("audit"))
         made.audit = whole.text("audit");
     whole.end();
+    const bool isLimited = std::any_of(made.rules.peers.begin(), made.rules.peers.end(),
+                                       [](const Dimse::Peer& peer) { return peer.studies != nullptr; });
+    // One would only have to call oneself otherwise.
+    if (result.good() && isLimited && made.rules.anyone)
+        result = Result::failure(
+            QStringLiteral("there can be no rights for anyone beside peers that are kept to some studies"));
     const bool isCalledSecurely = std::any_of(made.rules.peers.begin(), made.rules.peers.end(),
                                               [](const Dimse::Peer& peer) { return peer.isSecure; });
     if (result.good() && isCalledSecurely && (!made.tls || made.tls->caFile.isEmpty()))

@@ -19,6 +19,12 @@ public:
     /// On failure nothing has begun.
     Result start();
 
+    /// Whether there is a certificate to renew.
+    bool hasCertificate() const { return mService->hasCertificate(); }
+
+    /// Has associations from here on meet the certificate and key that the files hold now. On failure the former ones stay.
+    Result renewCertificate() { return mService->renewCertificate(); }
+
     /// Returns when the messages that have begun are answered, or their time is over.
     void stop();
 

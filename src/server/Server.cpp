@@ -298,7 +298,13 @@ Result Server::start()
 
 Result Server::renewCertificate()
 {
-    return d->http.renewCertificate();
+    const Result renewed = d->http.renewCertificate();
+    return renewed.good() && d->dimse != nullptr ? d->dimse->renewCertificate() : renewed;
+}
+
+bool Server::hasCertificate() const
+{
+    return d->http.address().startsWith("https:") || (d->dimse != nullptr && d->dimse->hasCertificate());
 }
 
 /// The watchers see it to its end.

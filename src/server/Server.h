@@ -54,6 +54,9 @@ public:
     /// Has connections from here on meet the certificate and key that the files hold now. On failure the former ones stay.
     Result renewCertificate();
 
+    /// Whether there is a certificate to renew.
+    bool hasCertificate() const;
+
     /// Returns when the requests in flight are answered, or their time is over.
     void stop();
 

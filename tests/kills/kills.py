@@ -4,8 +4,8 @@
     kills.py KDD [--uploads N] [--senders N] [--servers N] [--seed N] [--database sqlite|postgresql] [--folder FOLDER]
 
 Several servers share one archive. Several senders take what is to be sent from one list, in which some objects stand twice
-and some have another one of the same UID, and send again whatever was not told as stored, until it is; some requests are
-broken off by their sender. Servers, and a worker that builds what waits, are killed at random moments and started anew.
+and some have another one of the same UID, and send again whatever was not told as stored, until it is: half of them by
+STOW-RS, half over associations. Some requests are broken off by their sender, some senders killed. Servers, and a worker that builds what waits, are killed at random moments and started anew.
 In the end every object that was told as stored has to be there, once, as it was sent; nothing may be left over; and every
 tag file has to be byte for byte what a build of all files makes.
 
@@ -22,6 +22,7 @@ import re
 import shutil
 import signal
 import socket
+import struct
 import subprocess
 import sys
 import tempfile
@@ -64,18 +65,20 @@ class Server:
     """One that is started again after each of its ends, at another port."""
 
     def __init__(self, archive, name):
-        self.archive, self.name, self.port, self.process = archive, name, None, None
+        self.archive, self.name, self.port, self.dicom, self.process = archive, name, None, None, None
         self.start()
 
     def start(self):
-        self.process = self.archive.begin("--json", "serve", "--stow", "--listen", "127.0.0.1:0", stdout=subprocess.PIPE)
+        self.process = self.archive.begin("--json", "serve", "--stow", "--listen", "127.0.0.1:0", "--dicom", "127.0.0.1:0",
+                                          stdout=subprocess.PIPE)
         said = self.process.stdout.readline()
         if not said:
             raise RuntimeError("%s does not start: see %s" % (self.name, self.archive.log.name))
+        self.dicom = json.loads(said)["dicom"].rpartition(":")[2]
         self.port = int(json.loads(said)["address"].rpartition(":")[2])
 
     def kill(self):
-        self.port = None
+        self.port, self.dicom = None, None
         self.process.kill()
         self.process.wait()
         self.process.stdout.close()
@@ -195,6 +198,44 @@ class Stow:
         return outcomes
 
 
+class Association:
+    """Sends by DCMTK's storescu: some objects, one after the other."""
+
+    TOLD = {"Success": "stored", "Unknown Status: 0x%x" % OTHER_OBJECT: "refused"}
+
+    def __init__(self, template, chance, folder):
+        self.template, self.chance, self.folder = template, chance, folder
+        os.makedirs(folder)
+
+    def most(self):
+        return self.chance.choice((1, 3, 8, 20))
+
+    def send(self, server, uploads):
+        by_path = {}
+        for upload in uploads:
+            path = os.path.join(self.folder, "%d" % len(by_path))
+            by_path[path] = upload
+            with open(path, "wb") as file:
+                file.write(object_of(self.template, upload))
+        port = server.dicom
+        if port is None:
+            raise ConnectionError("it is not there")
+        with subprocess.Popen(["storescu", "-v", "-nh", "-aec", "KDD", "127.0.0.1", port, *by_path], stdout=subprocess.PIPE,
+                              stderr=subprocess.STDOUT) as process:
+            if self.chance.random() < 0.1:
+                time.sleep(self.chance.uniform(0, 0.3))
+                process.kill()
+            said = process.communicate()[0].decode()
+        outcomes, path = {}, None
+        for line in said.splitlines():
+            if line.startswith("I: Sending file: "):
+                path = line[len("I: Sending file: "):]
+            answered = re.match(r".: Received Store Response \((.*)\)$", line)
+            if answered:
+                outcomes[by_path[path]] = self.TOLD.get(answered[1], answered[1])
+        return outcomes
+
+
 def object_of(template, upload):
     pixels = bytes(template.pixels)
     return (template.head_of(upload.study, upload.series, upload.number) + upload.content.to_bytes(2, "little") + pixels[2:])
@@ -280,6 +321,11 @@ class Killer(threading.Thread):
             worker.wait()
 
 
+def dataset_of(file):
+    """What stands behind the meta information, which is the receiver's own of what comes over an association."""
+    return file[144 + struct.unpack_from("<I", file, 140)[0]:]
+
+
 def look_at_files(archive, template, ledger):
     """Each object that was sent is there once, as it was told; nothing else is."""
     objects = archive.path("store", "objects")
@@ -289,7 +335,7 @@ def look_at_files(archive, template, ledger):
             ledger.fault("two objects of one UID were told as stored: %s" % (image,))
         path = os.path.join(template.study(image.study), template.series(image.study, image.series),
                             template.uid(*image[:3]) + ".dcm")
-        expected[path] = object_of(template, image._replace(content=min(stored)))
+        expected[path] = dataset_of(object_of(template, image._replace(content=min(stored))))
     for image in ledger.sent:
         if image not in ledger.stored:
             ledger.fault("nobody was told that it is stored, and nobody sends it any more: %s" % (image,))
@@ -304,7 +350,7 @@ def look_at_files(archive, template, ledger):
                 ledger.fault("nobody was told of %s, or it is there twice" % os.path.join(place, name))
                 continue
             with open(os.path.join(place, name), "rb") as file:
-                if file.read() != wanted:
+                if dataset_of(file.read()) != wanted:
                     ledger.fault("not what was told as stored: " + path)
     for path in expected:
         ledger.fault("told as stored, and lost: " + path)
@@ -356,7 +402,9 @@ def run(options, folder, database):
     ledger = Ledger()
     servers = [Server(archive, "server %d" % number) for number in range(options.servers)]
     own = lambda: random.Random(chance.getrandbits(32))
-    senders = [Sender(Stow(template, own()), uploads, servers, ledger, own()) for _ in range(options.senders)]
+    ways = [Association(template, own(), archive.path("sender%d" % number)) if number % 2 else Stow(template, own())
+            for number in range(options.senders)]
+    senders = [Sender(way, uploads, servers, ledger, own()) for way in ways]
     killer = Killer(archive, servers, ledger, own())
     start = time.monotonic()
     for thread in [*senders, killer]:

@@ -1,10 +1,11 @@
 #include "server/dimse/Association.h"
 
+#include "server/dimse/MetaHeader.h"
 #include "server/dimse/SinkStream.h"
 
-#include <dcmtk/dcmdata/dcistrmb.h>
 #include <dcmtk/dcmdata/dctk.h>
 #include <dcmtk/dcmnet/cond.h>
+#include <kddlib/DicomFileReader.h>
 #include <kddlib/LogFile.h>
 
 #include <algorithm>
@@ -14,12 +15,6 @@ namespace Kdd::Dimse
 {
 namespace
 {
-
-/// Of an identifier [bytes]; one with a list of a thousand UIDs has as much.
-constexpr qint64 kMostIdentifier = 64 * 1024;
-
-/// Items of an identifier, each of which may lie inside the one before it: DCMTK recurses once for each level.
-constexpr int kMostItems = 256;
 
 /// Studies of one method that are kept for the report of an association.
 constexpr int kMostStudies = 100;
@@ -61,11 +56,14 @@ Association::Association(DcmtkAssociation dcmtk, PeerConnection& connection, Cal
     mRecord.caller = std::move(caller);
     mRecord.caller.title = shown(trimmed(asked.callingAPTitle));
     mRecord.caller.rights = settings.rules.rightsOf(mRecord.caller.title, mRecord.caller.address);
+    mRecord.caller.studies = settings.rules.studiesOf(mRecord.caller.title);
     mRecord.called = shown(trimmed(asked.calledAPTitle));
 }
 
 Association::~Association()
 {
+    for (const WaitingReport& waiting : mReports)
+        waiting.ended(false);
     mRecord.duration = std::chrono::steady_clock::now() - mBegun;
     mObserver.ended(mRecord);
 }
@@ -208,18 +206,38 @@ void Association::abort()
 
 bool Association::answerNext()
 {
-    switch (mConnection.await(mSettings.idle)) {
+    switch (mConnection.await(restTime())) {
     case PeerConnection::Came::Nothing:
-        LogFile::printf("Association %llu of \"%s\" has ended: nothing came for %lld s", mRecord.id,
-                        mRecord.caller.title.constData(), static_cast<long long>(mSettings.idle.count()));
-        abort();
-        return false;
+        return endRest();
     case PeerConnection::Came::Stop:
         abort();
         return false;
     case PeerConnection::Came::Something:
         break;
     }
+    return receiveNext();
+}
+
+std::chrono::milliseconds Association::restTime() const
+{
+    if (mReports.empty())
+        return mSettings.idle;
+    return mReports.front().message ? std::chrono::milliseconds(mSettings.patience) : mSettings.linger;
+}
+
+/// Whoever says nothing waits for something, or for nothing any more.
+bool Association::endRest()
+{
+    if (!mReports.empty() && !mReports.front().message && sendReport(mReports.front()))
+        return true;
+    LogFile::printf("Association %llu of \"%s\" has ended: nothing came for %lld ms", mRecord.id,
+                    mRecord.caller.title.constData(), static_cast<long long>(restTime().count()));
+    abort();
+    return false;
+}
+
+bool Association::receiveNext()
+{
     mConnection.beginMessage();
     T_ASC_PresentationContextID id = 0;
     T_DIMSE_Message message;
@@ -261,6 +279,8 @@ bool Association::answer(T_ASC_PresentationContextID id, T_DIMSE_Message& messag
     // What is asked to be cancelled has been answered by now.
     if (message.CommandField == DIMSE_C_CANCEL_RQ)
         return true;
+    if (message.CommandField == DIMSE_N_EVENT_REPORT_RSP && endReport(message))
+        return true;
     const PresentationContext* const context = contextOf(id);
     if (context != nullptr && context->isTaken) {
         for (const auto& provider : mProviders) {
@@ -289,30 +309,27 @@ bool Association::receive(const Command& command, DcmOutputStream& stream, qint6
     return id == command.context.id;
 }
 
-std::unique_ptr<DcmDataset> Association::receiveIdentifier(const Command& command, bool& isGood)
+std::unique_ptr<DcmDataset> Association::receiveIdentifier(const Command& command, bool& isGood, qint64 most)
 {
-    QByteArray bytes;
+    // Read as a file is, with which the library sees how deep items lie inside each other: DCMTK recurses for each level.
+    MetaHeader meta;
+    meta.sopClass = command.context.sopClass;
+    meta.sopInstance = command.context.sopClass;
+    meta.transferSyntax = command.context.transferSyntax;
+    QByteArray bytes = meta.bytes();
+    qint64 size = 0;
     SinkStream stream([&](const char* from, qint64 count) {
-        if (bytes.size() + count <= kMostIdentifier + 1)
+        size += count;
+        if (size <= most)
             bytes.append(from, static_cast<int>(count));
-        else
-            bytes.resize(kMostIdentifier + 1);
     });
-    if (!receive(command, stream, PduLimits().dataset))
+    if (!receive(command, stream, std::max(PduLimits().dataset, 2 * most)))
         return nullptr;
-    auto dataset = std::make_unique<DcmDataset>();
-    isGood = bytes.size() <= kMostIdentifier && bytes.count(QByteArray("\xfe\xff\x00\xe0", 4)) <= kMostItems;
-    if (!isGood)
-        return dataset;
-    DcmInputBufferStream input;
-    input.setBuffer(bytes.constData(), bytes.size());
-    input.setEos();
-    dataset->transferInit();
-    isGood = dataset->read(input, DcmXfer(command.context.transferSyntax.constData()).getXfer()).good();
-    dataset->transferEnd();
-    // The elements may have left their values in the buffer, which goes.
-    isGood = isGood && dataset->loadAllDataIntoMemory().good();
-    return dataset;
+    DcmFileFormat file;
+    isGood = size <= most && (size == 0 || readDicomBuffer(bytes, file).good()) &&
+             file.loadAllDataIntoMemory().good();
+    std::unique_ptr<DcmDataset> dataset(isGood ? file.getAndRemoveDataset() : nullptr);
+    return dataset != nullptr ? std::move(dataset) : std::make_unique<DcmDataset>();
 }
 
 bool Association::send(const PresentationContext& context, T_DIMSE_Message& message, DcmDataset* dataset,
@@ -338,6 +355,29 @@ bool Association::receiveAnswer(T_DIMSE_Message& answer)
     const OFCondition came = DIMSE_receiveCommand(mDcmtk.get(), DIMSE_BLOCKING, 0, &id, &answer, &detail);
     const std::unique_ptr<DcmDataset> owned(detail);
     return came.good() && contextOf(id) != nullptr;
+}
+
+void Association::report(const PresentationContext& context, EventReport report,
+                         std::function<void(bool)> ended)
+{
+    mReports.push_back({context.id, std::move(report), std::move(ended), std::nullopt});
+}
+
+bool Association::sendReport(WaitingReport& waiting)
+{
+    waiting.message = mDcmtk->nextMsgID++;
+    return waiting.report.send(*mDcmtk, waiting.context, *waiting.message);
+}
+
+/// False: nobody asked for that answer.
+bool Association::endReport(const T_DIMSE_Message& answer)
+{
+    if (mReports.empty() || !mReports.front().message || !isReportAnswer(answer, *mReports.front().message))
+        return false;
+    const WaitingReport ended = std::move(mReports.front());
+    mReports.pop_front();
+    ended.ended(true);
+    return true;
 }
 
 void Association::note(const Performed& performed)

@@ -3,12 +3,15 @@
 #include "server/dimse/AssociationDoor.h"
 #include "server/dimse/AssociationObserver.h"
 #include "server/dimse/DimseSettings.h"
+#include "server/dimse/EventReport.h"
 #include "server/dimse/ServiceProvider.h"
 
 #include <dcmtk/config/osconfig.h>
 
 #include <dcmtk/dcmnet/dimse.h>
 
+#include <deque>
+#include <functional>
 #include <memory>
 #include <vector>
 
@@ -57,9 +60,10 @@ public:
     /// Receives the dataset of a message into `stream` as it comes, of at most `most` bytes. False: the association is lost.
     bool receive(const Command& command, DcmOutputStream& stream, qint64 most);
 
-    /// Receives a dataset that is meant to be small, as identifiers of searches are. Null: the association is lost; `isGood` is
-    /// false when the dataset came and cannot be read.
-    std::unique_ptr<DcmDataset> receiveIdentifier(const Command& command, bool& isGood);
+    /// Receives a dataset that is meant to be small, of at most `most` bytes, as identifiers of searches are. Null: the
+    /// association is lost; `isGood` is false when the dataset came and cannot be read.
+    std::unique_ptr<DcmDataset> receiveIdentifier(const Command& command, bool& isGood,
+                                                  qint64 most = kMostIdentifier);
 
     /// Sends an answer, with a dataset where there is one, and `detail` on the status. False: the association is lost.
     bool send(const PresentationContext& context, T_DIMSE_Message& message, DcmDataset* dataset = nullptr,
@@ -71,16 +75,44 @@ public:
     /// Receives the answer to a message that was sent over the association. False: the association is lost.
     bool receiveAnswer(T_DIMSE_Message& answer);
 
+    /// Tells the other side of an event as soon as it rests, for it may be about to leave and wait for an association of ours.
+    /// `ended` is called once, on this thread: with true when it has answered, else when the association has ended.
+    void report(const PresentationContext& context, EventReport report, std::function<void(bool)> ended);
+
+    /// Whether the server stops: what is on its way shall come to an end.
+    bool isStopping() const { return mConnection.isStopping(); }
+
+    /// What else is connected for the sake of the association.
+    BreakSwitch& breakSwitch() { return mConnection.breakSwitch(); }
+
+    std::chrono::seconds patience() const { return mSettings.patience; }
+
     /// Adds to what the association is reported to have done.
     void note(const Performed& performed);
 
 private:
+    struct WaitingReport
+    {
+        quint8 context = 0;
+        EventReport report;
+        std::function<void(bool)> ended;
+        std::optional<quint16> message;  // by which it was sent
+    };
+
+    /// Of an identifier [bytes]; one with a list of a thousand UIDs has as much.
+    static constexpr qint64 kMostIdentifier = 64 * 1024;
+
     bool isWelcome();
     void reject(T_ASC_RejectParametersResult result, T_ASC_RejectParametersReason reason, const char* why);
     bool negotiate();
     void negotiate(const T_ASC_PresentationContext& proposed);
     bool isAllowed(const ServiceProvider* provider) const;
     bool answerNext();
+    bool receiveNext();
+    bool endRest();
+    std::chrono::milliseconds restTime() const;
+    bool sendReport(WaitingReport& waiting);
+    bool endReport(const T_DIMSE_Message& answer);
     bool answer(T_ASC_PresentationContextID id, T_DIMSE_Message& message);
     void endBy(const OFCondition& condition);
     void abort();
@@ -92,6 +124,7 @@ private:
     const Providers& mProviders;
     AssociationObserver& mObserver;
     std::vector<PresentationContext> mContexts;
+    std::deque<WaitingReport> mReports;  // the first may have been sent
     AssociationRecord mRecord;
     std::chrono::steady_clock::time_point mBegun = std::chrono::steady_clock::now();
 };

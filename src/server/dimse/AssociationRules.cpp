@@ -25,4 +25,10 @@ Rights AssociationRules::rightsOf(const QByteArray& title, const QByteArray& add
     return peer->addresses.isEmpty() || peer->addresses.contains(address) ? peer->rights : Rights();
 }
 
+std::shared_ptr<const Kxg::StudyLimits> AssociationRules::studiesOf(const QByteArray& title) const
+{
+    const Peer* const peer = find(title);
+    return peer == nullptr ? nullptr : peer->studies;
+}
+
 }  // namespace Kdd::Dimse

@@ -5,6 +5,10 @@
 #include <QHash>
 #include <QVector>
 
+#include <kddlib/StudyLimits.h>
+
+#include <memory>
+
 namespace Kdd::Dimse
 {
 
@@ -27,6 +31,7 @@ struct Peer
     quint16 port = 0;               ///< likewise
     bool isSecure = false;          ///< it is called over TLS
     Rights rights;
+    std::shared_ptr<const Kxg::StudyLimits> studies = nullptr;  ///< that it may see; null: all
 };
 
 /// Which associations are accepted, and for what.
@@ -47,6 +52,9 @@ struct AssociationRules
 
     /// Of who calls under that title from that numeric address. None: the association is rejected.
     Rights rightsOf(const QByteArray& title, const QByteArray& address) const;
+
+    /// That who has that title may see; null: all.
+    std::shared_ptr<const Kxg::StudyLimits> studiesOf(const QByteArray& title) const;
 };
 
 /// Who asked for an association.
@@ -56,6 +64,7 @@ struct Caller
     QByteArray address;      ///< numeric
     QByteArray certificate;  ///< whom the certificate names that it showed; empty when it showed none
     Rights rights;
+    std::shared_ptr<const Kxg::StudyLimits> studies;  ///< that it may see; null: all
 };
 
 }  // namespace Kdd::Dimse

@@ -15,8 +15,14 @@ constexpr std::size_t kMostAtATime = 50;
 
 }  // namespace
 
-ArrivedObject CommitRounds::commit(std::unique_ptr<ObjectArrival> arrival)
+ArrivedObject CommitRounds::commit(std::unique_ptr<ObjectArrival> arrival,
+                                   const ObjectStore::Admission& admits)
 {
+    if (admits) {
+        std::vector<std::unique_ptr<ObjectArrival>> alone;
+        alone.push_back(std::move(arrival));
+        return store(std::move(alone), admits).front();
+    }
     Waiting mine;
     mine.arrival = std::move(arrival);
     std::unique_lock<std::mutex> lock(mMutex);
@@ -28,6 +34,22 @@ ArrivedObject CommitRounds::commit(std::unique_ptr<ObjectArrival> arrival)
             mChanged.wait(lock);
     }
     return std::move(mine.object);
+}
+
+/// What becomes of each.
+std::vector<ArrivedObject> CommitRounds::store(std::vector<std::unique_ptr<ObjectArrival>> whole,
+                                               const ObjectStore::Admission& admits)
+{
+    std::vector<ArrivedObject> objects;
+    const Result connected = mArrivals.database().ask([&](Kxg::Catalogue& catalogue) {
+        objects = mArrivals.store().commit(whole, catalogue, {}, admits);
+        return Result();
+    });
+    ArrivedObject failed;
+    failed.fault = ArrivalFault::Failed;
+    failed.reason = connected.text();
+    objects.resize(whole.size(), failed);
+    return objects;
 }
 
 void CommitRounds::runRound(std::unique_lock<std::mutex>& lock)
@@ -42,16 +64,7 @@ void CommitRounds::runRound(std::unique_lock<std::mutex>& lock)
     }
     ++mRounds;
     lock.unlock();
-    std::vector<ArrivedObject> objects;
-    const Result connected = mArrivals.database().ask([&](Kxg::Catalogue& catalogue) {
-        objects = mArrivals.store().commit(whole, catalogue);
-        return Result();
-    });
-    ArrivedObject failed;
-    failed.fault = ArrivalFault::Failed;
-    failed.reason = connected.text();
-    objects.resize(taken.size(), failed);
-    whole.clear();
+    std::vector<ArrivedObject> objects = store(std::move(whole), {});
     lock.lock();
     --mRounds;
     for (std::size_t i = 0; i < taken.size(); ++i) {

@@ -20,8 +20,9 @@ public:
     {
     }
 
-    /// Stores an object that has come whole; returns when it is stored for good, or is not.
-    ArrivedObject commit(std::unique_ptr<ObjectArrival> arrival);
+    /// Stores an object that has come whole; returns when it is stored for good, or is not. One that only some may store is
+    /// stored alone.
+    ArrivedObject commit(std::unique_ptr<ObjectArrival> arrival, const ObjectStore::Admission& admits = {});
 
 private:
     struct Waiting
@@ -32,6 +33,8 @@ private:
         bool isDone = false;
     };
 
+    std::vector<ArrivedObject> store(std::vector<std::unique_ptr<ObjectArrival>> whole,
+                                     const ObjectStore::Admission& admits);
     void runRound(std::unique_lock<std::mutex>& lock);
 
     DicomWeb::ArrivalService& mArrivals;

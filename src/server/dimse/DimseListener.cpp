@@ -108,6 +108,8 @@ struct DimseListener::Private
     {
     }
 
+    std::shared_ptr<Http::TlsContext> readCertificate(Result& result) const;
+    std::shared_ptr<Http::TlsContext> context() const { return std::atomic_load(&tls); }
     Result listen();
     void accept();
     bool acceptOne();
@@ -122,7 +124,7 @@ struct DimseListener::Private
     const Providers providers;
     AssociationObserver& observer;
     std::unique_ptr<AssociationDoor> door;
-    std::unique_ptr<Http::TlsContext> tls;
+    std::shared_ptr<Http::TlsContext> tls;  // to be had by `context`
     Descriptor socket;
     Descriptor stopped;  // can be read from when the server stops
     std::thread acceptor;
@@ -139,8 +141,7 @@ std::unique_ptr<DimseListener> DimseListener::make(const DimseSettings& settings
     auto made = std::make_unique<Private>(settings, std::move(providers), observer);
     result = {};
     if (settings.tls)
-        made->tls = Http::TlsContext::make(settings.tls->certificateFile, settings.tls->keyFile,
-                                           settings.tls->caFile, result);
+        made->tls = made->readCertificate(result);
     if (result.good())
         made->door = AssociationDoor::open(result);
     if (result.bad())
@@ -156,6 +157,23 @@ DimseListener::DimseListener(std::unique_ptr<Private> made)
 DimseListener::~DimseListener()
 {
     stop();
+}
+
+std::shared_ptr<Http::TlsContext> DimseListener::Private::readCertificate(Result& result) const
+{
+    return Http::TlsContext::make(settings.tls->certificateFile, settings.tls->keyFile, settings.tls->caFile,
+                                  result);
+}
+
+Result DimseListener::renewCertificate()
+{
+    Result result;
+    if (!d->settings.tls)
+        return result;
+    const std::shared_ptr<Http::TlsContext> renewed = d->readCertificate(result);
+    if (renewed != nullptr)
+        std::atomic_store(&d->tls, renewed);
+    return result;
 }
 
 Http::ListenAddress DimseListener::address() const
@@ -244,8 +262,9 @@ void DimseListener::Private::serve(std::list<Worker>::iterator worker, int taken
 void DimseListener::Private::associate(std::list<Worker>::iterator worker, int taken, const QByteArray& peer)
 {
     std::unique_ptr<Http::Transport> transport = std::make_unique<Http::PlainTransport>(taken);
-    if (tls != nullptr)
-        transport = tls->accept(taken);
+    const std::shared_ptr<Http::TlsContext> tlsNow = context();
+    if (tlsNow != nullptr)
+        transport = tlsNow->accept(taken);
     PeerConnection connection(taken, std::move(transport), stopped.number(), settings.patience, PduLimits());
     const auto show = [&](PeerConnection* breakable, bool isAssociation) {
         const std::lock_guard<std::mutex> lock(mutex);
@@ -262,7 +281,7 @@ void DimseListener::Private::associate(std::list<Worker>::iterator worker, int t
 
 bool DimseListener::Private::isTrusted(const PeerConnection& connection, const QByteArray& peer) const
 {
-    if (tls == nullptr || !settings.tls->needsCertificate || !connection.certificate().isEmpty())
+    if (!settings.tls || !settings.tls->needsCertificate || !connection.certificate().isEmpty())
         return true;
     LogFile::warnf("A connection from %s is closed: it showed no certificate", peer.constData());
     return false;

@@ -25,6 +25,9 @@ public:
     /// Takes no more associations, and returns when the messages that have begun are answered, or their time is over.
     void stop();
 
+    /// Has connections from here on meet the certificate and key that the files hold now. On failure the former ones stay.
+    Result renewCertificate();
+
     /// With the port that 0 stood for.
     Http::ListenAddress address() const;
 

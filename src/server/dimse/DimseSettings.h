@@ -26,8 +26,9 @@ struct DimseSettings
     int associations = 64;  ///< at a time; further ones are rejected for the time being
     std::chrono::seconds patience{
         30};  ///< for an association request, for a message once it began, for taking answers
-    std::chrono::seconds idle{300};         ///< between two messages
-    std::chrono::milliseconds stop{30000};  ///< for messages that have begun when the server stops
+    std::chrono::seconds idle{300};          ///< between two messages
+    std::chrono::milliseconds linger{1000};  ///< so long nothing comes from who waits to be told something
+    std::chrono::milliseconds stop{30000};   ///< for messages that have begun when the server stops
 };
 
 }  // namespace Kdd::Dimse

@@ -101,7 +101,8 @@ bool FindProvider::handle(const Command& command, Association& association)
 
     std::vector<QByteArray> found;
     question.search.limit = mMostAnswers;
-    const QueryEnding ending = findObjects(question.search, mDatabase, mShelf, found);
+    const QueryEnding ending =
+        findObjects(question.search, association.caller().studies, mDatabase, mShelf, found);
     const quint16 status = showsAll(question) ? kPending : kPendingWithoutKeys;
     for (const QByteArray& json : found) {
         if (answering.isCancelled())

@@ -45,8 +45,8 @@ QueryEnding endingOf(const SearchRun& run, int limit)
 
 }  // namespace
 
-QueryEnding findObjects(const SearchRequest& search, const ThreadSearch& database, StudyShelf& shelf,
-                        std::vector<QByteArray>& found)
+QueryEnding findObjects(const SearchRequest& search, const StudyLimits& limits, const ThreadSearch& database,
+                        StudyShelf& shelf, std::vector<QByteArray>& found)
 {
     SearchPlan plan;
     QString reason;
@@ -55,8 +55,7 @@ QueryEnding findObjects(const SearchRequest& search, const ThreadSearch& databas
     bringInArrivals(search, shelf);
     QueryEnding ending;
     const QByteArray root;
-    // Whoever may query may see every study: rights of peers know no limits.
-    const Result result = database.ask(nullptr, [&](Kxg::StudySearch& connection) {
+    const Result result = database.ask(limits, [&](Kxg::StudySearch& connection) {
         FoundAnswers answers(search, root);
         SearchRun run(search, plan, connection, shelf);
         const Result done = run.run(answers);

@@ -32,6 +32,7 @@ public:
                   [&association](T_DIMSE_Message& answer) { return association.receiveAnswer(answer); })
     {
         mOrder.priority = request.Priority;
+        mOrder.patience = association.patience();
     }
 
     Sent send(const std::vector<RetrieveItem>& items, std::size_t index,

@@ -1,6 +1,6 @@
 #include "server/dimse/MoveProvider.h"
 
-#include "server/dimse/MoveAssociation.h"
+#include "server/dimse/OutgoingAssociation.h"
 #include "server/dimse/RetrieveRun.h"
 
 #include <dcmtk/dcmdata/dctk.h>
@@ -21,8 +21,10 @@ constexpr quint16 kUnknownDestination = 0xA801;
 class Destination : public RetrieveTarget
 {
 public:
-    Destination(MoveAssociation::Parties parties, DicomWeb::ObjectShelf& objects, const SendOrder& order)
+    Destination(OutgoingAssociation::Parties parties, DicomWeb::ObjectShelf& objects, const SendOrder& order,
+                BreakSwitch& breakSwitch)
         : mParties(std::move(parties))
+        , mSwitch(breakSwitch)
         , mObjects(objects)
         , mOrder(order)
     {
@@ -56,7 +58,7 @@ private:
     {
         Result result;
         mProposals = proposalsFor(items, index);
-        mAssociation = MoveAssociation::open(mParties, mProposals, result);
+        mAssociation = OutgoingAssociation::open(mParties, mProposals, mSwitch, result);
         if (mAssociation == nullptr) {
             LogFile::warnf("Nothing can be sent to \"%s\": %s", mParties.title.constData(),
                            qUtf8Printable(result.text()));
@@ -76,11 +78,12 @@ private:
         mIsUsed = false;
     }
 
-    const MoveAssociation::Parties mParties;
+    const OutgoingAssociation::Parties mParties;
+    BreakSwitch& mSwitch;
     DicomWeb::ObjectShelf& mObjects;
     const SendOrder mOrder;
     std::vector<ProposedContext> mProposals;
-    std::unique_ptr<MoveAssociation> mAssociation;
+    std::unique_ptr<OutgoingAssociation> mAssociation;
     std::unique_ptr<RetrieveSender> mSender;
     bool mIsUsed = false;   // something was sent over the present association
     qint64 mSentBytes = 0;  // over the former ones
@@ -117,7 +120,7 @@ bool MoveProvider::handle(const Command& command, Association& association)
     if (!receiveRetrieval(command, association, root, mSource, items, ending))
         return false;
     RetrieveRun run(command, association);
-    MoveAssociation::Parties parties;
+    OutgoingAssociation::Parties parties;
     parties.title = QByteArray(request.MoveDestination).trimmed();
     const Peer* const peer = association.rules().find(parties.title);
     if (peer == nullptr || peer->host.isEmpty())
@@ -129,7 +132,8 @@ bool MoveProvider::handle(const Command& command, Association& association)
     parties.tls = peer->isSecure ? mTls : std::nullopt;
     parties.patience = mPatience;
     Destination destination(std::move(parties), mSource.objects,
-                            {request.Priority, association.caller().title, request.MessageID});
+                            {request.Priority, association.caller().title, request.MessageID, mPatience},
+                            association.breakSwitch());
     return run.run(items, mSource, destination);
 }
 

@@ -82,7 +82,7 @@ bool PeerConnection::wait(short events, Clock::time_point end) const
     return ready > 0 && !mIsBroken;
 }
 
-PeerConnection::Came PeerConnection::await(std::chrono::seconds time)
+PeerConnection::Came PeerConnection::await(std::chrono::milliseconds time)
 {
     if (mTransport->hasUnread())
         return Came::Something;
@@ -95,6 +95,12 @@ PeerConnection::Came PeerConnection::await(std::chrono::seconds time)
     if (ready <= 0)
         return Came::Nothing;
     return both[1].revents != 0 ? Came::Stop : Came::Something;
+}
+
+bool PeerConnection::isStopping() const
+{
+    pollfd stop = {mStop, POLLIN, 0};
+    return ::poll(&stop, 1, 0) > 0;
 }
 
 bool PeerConnection::receive(QByteArray& bytes, int size)
@@ -208,6 +214,7 @@ void PeerConnection::breakOff()
 {
     mIsBroken = true;
     ::shutdown(mSocket, SHUT_RDWR);
+    mSwitch.breakOff();
 }
 
 }  // namespace Kdd::Dimse

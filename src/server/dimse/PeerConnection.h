@@ -1,5 +1,6 @@
 #pragma once
 
+#include "server/dimse/BreakSwitch.h"
 #include "server/dimse/PduGuard.h"
 #include "server/http/Transport.h"
 
@@ -41,7 +42,10 @@ public:
     bool receiveRequest();
 
     /// Waits for a message to begin.
-    Came await(std::chrono::seconds time);
+    Came await(std::chrono::milliseconds time);
+
+    /// Whether the server stops.
+    bool isStopping() const;
 
     /// From here on the other side has the time of one message again.
     void beginMessage();
@@ -54,6 +58,9 @@ public:
 
     /// Ends every wait from now on. On any thread.
     void breakOff();
+
+    /// Connections that are had for the sake of this one are broken off with it.
+    BreakSwitch& breakSwitch() { return mSwitch; }
 
     /// Up to so many bytes; 0 when there will be no more.
     qint64 read(char* to, qint64 size);
@@ -87,6 +94,7 @@ private:
     qint64 mBytes = 0;  // since then
     bool mIsOpen = true;
     std::atomic<bool> mIsBroken{false};
+    BreakSwitch mSwitch;
 };
 
 }  // namespace Kdd::Dimse

@@ -1,7 +1,5 @@
 #include "server/dimse/RetrieveList.h"
 
-#include "server/dimse/FindSearch.h"
-
 #include <QJsonArray>
 #include <QJsonDocument>
 #include <QJsonObject>
@@ -79,8 +77,8 @@ SearchLevel searchLevelOf(QueryLevel level)
 }
 
 /// Where the identifier does not name all levels above its own, searches know them.
-QueryEnding searchPaths(const RetrieveIdentifier& identifier, const RetrieveSource& source,
-                        std::vector<ResourcePath>& paths)
+QueryEnding searchPaths(const RetrieveIdentifier& identifier, const StudyLimits& limits,
+                        const RetrieveSource& source, std::vector<ResourcePath>& paths)
 {
     SearchRequest search;
     std::vector<QByteArray> found;
@@ -96,7 +94,7 @@ QueryEnding searchPaths(const RetrieveIdentifier& identifier, const RetrieveSour
         condition.list = {identifier.patientID};
         search.conditions.push_back(condition);
     }
-    const QueryEnding ending = findObjects(search, source.database, source.studies, found);
+    const QueryEnding ending = findObjects(search, limits, source.database, source.studies, found);
     for (const QByteArray& json : found) {
         const QJsonObject object = QJsonDocument::fromJson(json).object();
         ResourcePath path;
@@ -154,8 +152,9 @@ QByteArray storedSyntaxOf(const TagMap& image)
     if (element == nullptr || element->vr() != VrCode::OB || element->value().size() != 1)
         return {};
     const int number = static_cast<unsigned char>(element->value().at(0));
-    const char* uid =
-        number <= EXS_PrivateGE_LEI_WithBigEndianPixelData ? DcmXfer(static_cast<E_TransferSyntax>(number)).getXferID() : nullptr;
+    const char* uid = number <= EXS_PrivateGE_LEI_WithBigEndianPixelData
+                          ? DcmXfer(static_cast<E_TransferSyntax>(number)).getXferID()
+                          : nullptr;
     return uid;
 }
 
@@ -176,8 +175,14 @@ void describeItems(const ServedStudy& study, const QByteArray& studyUID, const Q
 }
 
 /// Nothing there is no failure: then nothing is sent.
-QueryEnding addItems(const ResourcePath& path, const RetrieveSource& source, std::vector<RetrieveItem>& items)
+QueryEnding addItems(const ResourcePath& path, const StudyLimits& limits, const RetrieveSource& source,
+                     std::vector<RetrieveItem>& items)
 {
+    const Sight sight = limits == nullptr ? Sight::Seen : source.sight.look(limits, path.study);
+    if (sight != Sight::Seen)
+        return sight == Sight::Hidden
+                   ? QueryEnding()
+                   : QueryEnding{kNoDatabase, QStringLiteral("The image database cannot be asked now")};
     std::shared_ptr<const ServedStudy> study;
     QVector<ListedImage> images;
     const Verdict found = findStudy(source.studies, path, study);
@@ -215,21 +220,21 @@ bool RetrieveIdentifier::read(DcmItem& dataset, QueryRoot root, RetrieveIdentifi
     return reason.isEmpty();
 }
 
-QueryEnding listItems(const RetrieveIdentifier& identifier, const RetrieveSource& source,
-                      std::vector<RetrieveItem>& items)
+QueryEnding listItems(const RetrieveIdentifier& identifier, const StudyLimits& limits,
+                      const RetrieveSource& source, std::vector<RetrieveItem>& items)
 {
     std::vector<ResourcePath> paths;
     QueryEnding ending;
     if (namesAll(identifier))
         paths = namedPaths(identifier);
     else
-        ending = searchPaths(identifier, source, paths);
+        ending = searchPaths(identifier, limits, source, paths);
     // One after the other of the same study, so that its tag file is looked up once.
     std::stable_sort(paths.begin(), paths.end(),
                      [](const ResourcePath& a, const ResourcePath& b) { return a.study < b.study; });
     for (const ResourcePath& path : paths) {
         if (ending.good())
-            ending = addItems(path, source, items);
+            ending = addItems(path, limits, source, items);
     }
     return ending;
 }

@@ -3,7 +3,8 @@
 #include "server/dicomweb/StudyShelf.h"
 #include "server/dicomweb/retrieve/ImageFinder.h"
 #include "server/dicomweb/retrieve/ObjectShelf.h"
-#include "server/dicomweb/search/ThreadSearch.h"
+#include "server/dicomweb/search/StudySight.h"
+#include "server/dimse/FindSearch.h"
 #include "server/dimse/QueryEnding.h"
 #include "server/dimse/QueryIdentifier.h"
 
@@ -20,6 +21,7 @@ struct RetrieveSource
     const DicomWeb::ThreadSearch& database;
     DicomWeb::StudyShelf& studies;
     DicomWeb::ObjectShelf& objects;
+    const DicomWeb::StudySight& sight;
 };
 
 /// What is to be retrieved: the unique keys of an identifier. Whatever else it says is passed over.
@@ -44,8 +46,9 @@ struct RetrieveItem
     QByteArray storedSyntax;  ///< as far as the tag file knows; empty when it does not
 };
 
-/// Puts all that the identifier names into `items`, as the tag files show it now, study by study.
-QueryEnding listItems(const RetrieveIdentifier& identifier, const RetrieveSource& source,
-                      std::vector<RetrieveItem>& items);
+/// Puts all that the identifier names and that is within the limits into `items`, as the tag files show it now, study by
+/// study.
+QueryEnding listItems(const RetrieveIdentifier& identifier, const StudyLimits& limits,
+                      const RetrieveSource& source, std::vector<RetrieveItem>& items);
 
 }  // namespace Kdd::Dimse

@@ -55,10 +55,13 @@ bool RetrieveRun::run(const std::vector<RetrieveItem>& items, const RetrieveSour
     for (std::size_t i = 0; i < items.size(); ++i) {
         if (isCancelled(target))
             return finish({kCancelled, {}}, target.sentBytes());
+        if (mAssociation.isStopping()) {
+            failFrom(items, i);
+            return finish({ending().status, QStringLiteral("The server stops")}, target.sentBytes());
+        }
         const Sent sent = sendNext(items, i, source, target);
         if (sent == Sent::Lost) {
-            for (; i < items.size(); ++i)
-                count(Sent::Failed, items[i]);
+            failFrom(items, i);
             if (!target.isSameAssociation())
                 break;
             // In the middle of an object no answer has a place.
@@ -82,6 +85,12 @@ Sent RetrieveRun::sendNext(const std::vector<RetrieveItem>& items, std::size_t i
         source.studies.find(item.study, mStudy);
     }
     return mStudy != nullptr ? target.send(items, index, *mStudy) : Sent::Failed;
+}
+
+void RetrieveRun::failFrom(const std::vector<RetrieveItem>& items, std::size_t index)
+{
+    for (; index < items.size(); ++index)
+        count(Sent::Failed, items[index]);
 }
 
 void RetrieveRun::count(Sent sent, const RetrieveItem& item)
@@ -177,7 +186,7 @@ bool receiveRetrieval(const Command& command, Association& association, QueryRoo
     else if (!RetrieveIdentifier::read(*dataset, root, identifier, reason))
         ending = {kMisunderstood, reason};
     else
-        ending = listItems(identifier, source, items);
+        ending = listItems(identifier, association.caller().studies, source, items);
     return true;
 }
 

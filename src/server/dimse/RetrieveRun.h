@@ -42,6 +42,7 @@ public:
 private:
     Sent sendNext(const std::vector<RetrieveItem>& items, std::size_t index, const RetrieveSource& source,
                   RetrieveTarget& target);
+    void failFrom(const std::vector<RetrieveItem>& items, std::size_t index);
     void count(Sent sent, const RetrieveItem& item);
     QueryEnding ending() const;
     bool isCancelled(const RetrieveTarget& target);

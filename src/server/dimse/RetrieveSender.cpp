@@ -20,6 +20,9 @@ using namespace DicomWeb;
 
 constexpr int kTaken = 1000;  // all that is taken is taken alike
 
+/// Whoever takes less for the length of an object holds a place and takes nothing [bytes/s].
+constexpr qint64 kLeastRate = 1024;
+
 /// Larger objects that have to be converted are made twice, and not kept in memory meanwhile [bytes].
 constexpr int kMostKept = 16 * 1024 * 1024;
 
@@ -98,7 +101,7 @@ Sent RetrieveSender::send(const ServedStudy& study, const RetrieveItem& item, Ob
     const quint16 message = mAssociation.nextMsgID++;
     if (!sendCommand(*context, item, order, message))
         return Sent::Lost;
-    const Sent sent = sendDataset(*context, std::move(body), made.metaLength);
+    const Sent sent = sendDataset(*context, std::move(body), made.metaLength, order.patience);
     return sent == Sent::Stored ? receiveAnswer(item, message) : sent;
 }
 
@@ -151,8 +154,15 @@ bool RetrieveSender::sendCommand(const SendContext& context, const RetrieveItem&
            sendBlock(context, DUL_COMMANDPDV, static_cast<const char*>(bytes), static_cast<int>(count), true);
 }
 
-Sent RetrieveSender::sendDataset(const SendContext& context, std::vector<Http::BodyPart> body, qint64 skipped)
+Sent RetrieveSender::sendDataset(const SendContext& context, std::vector<Http::BodyPart> body, qint64 skipped,
+                                 std::chrono::seconds patience)
 {
+    const auto begun = std::chrono::steady_clock::now();
+    const qint64 before = mSentBytes;
+    const auto isTooSlow = [&] {
+        return std::chrono::steady_clock::now() - begun >
+               patience + std::chrono::seconds((mSentBytes - before) / kLeastRate);
+    };
     // Fragments are even, all of them.
     const int most = static_cast<int>(std::min<unsigned long>(mAssociation.sendPDVLength, 1 << 20)) & ~1;
     BodyBlocks blocks(std::move(body));
@@ -172,7 +182,7 @@ Sent RetrieveSender::sendDataset(const SendContext& context, std::vector<Http::B
         int at = 0;
         // The last fragment says that it is, so one is kept back.
         for (; waiting.size() - at > most; at += most) {
-            if (!sendBlock(context, DUL_DATASETPDV, waiting.constData() + at, most, false))
+            if (isTooSlow() || !sendBlock(context, DUL_DATASETPDV, waiting.constData() + at, most, false))
                 return Sent::Lost;
             mSentBytes += most;
         }

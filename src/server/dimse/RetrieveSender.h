@@ -6,6 +6,7 @@
 
 #include <dcmtk/dcmnet/dimse.h>
 
+#include <chrono>
 #include <functional>
 
 namespace Kdd::Dimse
@@ -17,6 +18,7 @@ struct SendOrder
     T_DIMSE_Priority priority = DIMSE_PRIORITY_MEDIUM;
     QByteArray originator;  ///< title of who asked for them to be sent to another; empty: to itself
     quint16 originatorMessage = 0;
+    std::chrono::seconds patience{30};  ///< to take an object, beside a second for each so many bytes
 };
 
 /// Under which objects of a class can be sent in a transfer syntax.
@@ -63,7 +65,8 @@ public:
 private:
     bool sendCommand(const SendContext& context, const RetrieveItem& item, const SendOrder& order,
                      quint16 message);
-    Sent sendDataset(const SendContext& context, std::vector<Http::BodyPart> body, qint64 skipped);
+    Sent sendDataset(const SendContext& context, std::vector<Http::BodyPart> body, qint64 skipped,
+                     std::chrono::seconds patience);
     bool sendBlock(const SendContext& context, DUL_DATAPDV kind, const char* bytes, int count, bool isLast);
     Sent receiveAnswer(const RetrieveItem& item, quint16 message);
 

@@ -113,7 +113,10 @@ bool StoreProvider::handle(const Command& command, Association& association)
     ArrivedObject object;
     if (isAgreed) {
         arrival->end();
-        object = mRounds.commit(std::move(arrival));
+        ObjectStore::Admission admits;
+        if (const auto& studies = association.caller().studies)
+            admits = [this, studies](const TagMap& image) { return mSight.admits(studies, image); };
+        object = mRounds.commit(std::move(arrival), admits);
         told = toldOf(object.fault);
     }
     if (told.status != STATUS_Success)

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "server/dicomweb/search/StudySight.h"
 #include "server/dimse/CommitRounds.h"
 #include "server/dimse/ServiceProvider.h"
 
@@ -10,9 +11,11 @@ namespace Kdd::Dimse
 class StoreProvider : public ServiceProvider
 {
 public:
-    /// `arrivals` outlives the object.
-    StoreProvider(DicomWeb::ArrivalService& arrivals, bool takesUnknownClasses)
+    /// Both outlive the object.
+    StoreProvider(DicomWeb::ArrivalService& arrivals, const DicomWeb::StudySight& sight,
+                  bool takesUnknownClasses)
         : mArrivals(arrivals)
+        , mSight(sight)
         , mRounds(arrivals)
         , mTakesUnknownClasses(takesUnknownClasses)
     {
@@ -29,6 +32,7 @@ public:
 
 private:
     DicomWeb::ArrivalService& mArrivals;
+    const DicomWeb::StudySight& mSight;
     CommitRounds mRounds;
     const bool mTakesUnknownClasses;
 };

@@ -43,7 +43,8 @@ Outcome runReceive(const GlobalOptions& options, const DimseRequest& request)
         return Outcome::Failed;
     }
     tellAddress(options, *receiver);
-    received.awaitEnd([] { LogFile::printf("A peers file is read when the server starts, and not anew"); });
+    received.awaitEnd(
+        [&] { renewCertificate(receiver->hasCertificate(), [&] { return receiver->renewCertificate(); }); });
     receiver->stop();
     return Outcome::Done;
 }

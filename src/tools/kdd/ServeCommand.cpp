@@ -164,17 +164,6 @@ void warnOfNoArchive()
         LogFile::warnf("There is no archive here yet: %s", qUtf8Printable(result.text()));
 }
 
-void renewCertificate(Server& server)
-{
-    if (!server.address().startsWith("https:"))
-        return LogFile::printf("There is no certificate to be read anew: TLS is not in use");
-    const Result result = server.renewCertificate();
-    if (result.bad())
-        LogFile::errorf("The former certificate stays in use: %s", qUtf8Printable(result.text()));
-    else
-        LogFile::printf("Certificate and key were read anew");
-}
-
 Outcome runServe(const GlobalOptions& options, const ServeRequest& request)
 {
     ServerSettings settings;
@@ -192,7 +181,8 @@ Outcome runServe(const GlobalOptions& options, const ServeRequest& request)
     }
     warnOfNoArchive();
     tellAddress(options, *server, hasViewer);
-    received.awaitEnd([&] { renewCertificate(*server); });
+    received.awaitEnd(
+        [&] { renewCertificate(server->hasCertificate(), [&] { return server->renewCertificate(); }); });
     server->stop();
     return Outcome::Done;
 }

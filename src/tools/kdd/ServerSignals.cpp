@@ -1,6 +1,7 @@
 #include "tools/kdd/ServerSignals.h"
 
 #include <fcntl.h>
+#include <kddlib/LogFile.h>
 #include <unistd.h>
 
 namespace Kdd
@@ -44,6 +45,17 @@ void ServerSignals::awaitEnd(const std::function<void()>& renew) const
     std::signal(SIGINT, SIG_DFL);
     std::signal(SIGTERM, SIG_DFL);
     ::pthread_sigmask(SIG_UNBLOCK, &mSignals, nullptr);
+}
+
+void renewCertificate(bool hasCertificate, const std::function<Result()>& renew)
+{
+    if (!hasCertificate)
+        return LogFile::printf("There is no certificate to be read anew: TLS is not in use");
+    const Result result = renew();
+    if (result.bad())
+        LogFile::errorf("The former certificate stays in use: %s", qUtf8Printable(result.text()));
+    else
+        LogFile::printf("Certificate and key were read anew");
 }
 
 }  // namespace Kdd

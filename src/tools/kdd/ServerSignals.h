@@ -1,5 +1,7 @@
 #pragma once
 
+#include <kddlib/Result.h>
+
 #include <csignal>
 #include <functional>
 
@@ -23,5 +25,8 @@ private:
     sigset_t mSignals = {};
     sigset_t mFormer = {};
 };
+
+/// Has a server read its certificate anew, and tells what came of it.
+void renewCertificate(bool hasCertificate, const std::function<Result()>& renew);
 
 }  // namespace Kdd

@@ -1,4 +1,5 @@
 #include "DatabaseFixture.h"
+#include "platform/database/HeldFiles.h"
 #include "platform/database/StorageManager.h"
 
 #include <limits>
@@ -249,6 +250,31 @@ TEST_P(CatalogueTest, FilesOfAnImageAreFoundByWhatTheySayThemselves)
     EXPECT_EQ(files("x"), "/d/c shown 2 2.1 x2\n/d/a 2 2.1 x2\n") << "not what is shown as x now";
     EXPECT_EQ(files("y"), "/d/b shown 1 1.1 x\n");
     EXPECT_EQ(files("z"), "");
+}
+
+TEST_P(CatalogueTest, FilesThatCountAreFoundInEveryStudyByWhatTheySayThemselves)
+{
+    add({dicom("/d/a", "1", "1.1", "x"), dicom("/d/b", "1", "1.1", "y"), dicom("/e/a", "9", "9.1", "x")});
+    add({dicom("/d/c", "1", "1.1", "x")});
+    const auto held = [](const QList<QByteArray>& images) {
+        std::vector<HeldFile> found;
+        EXPECT_TRUE(heldFiles(images, found).good());
+        QStringList lines;
+        for (const HeldFile& file : found)
+            lines << QString::fromUtf8(file.sopInstanceUID + ' ' + file.path + ' ' + file.shownStudyUID +
+                                       ' ' + file.shownImage);
+        lines.sort();
+        return lines.join(QLatin1String(", ")).toStdString();
+    };
+    EXPECT_EQ(held({"x"}), "x /d/c 1 x, x /e/a 9 x");
+    correct({{"1", "x", "2", "2.1", "x2", "changes"}, {"1", "y", "1", "1.1", "x", "changes"}});
+    EXPECT_EQ(held({"x"}), "x /d/c 2 x2, x /e/a 9 x") << "not what is shown as x now";
+    EXPECT_EQ(held({"x2", "z"}), "");
+    QList<QByteArray> many;
+    for (int i = 0; i < 250; ++i)
+        many.append(QByteArray::number(i));
+    EXPECT_EQ(held(many << "y"), "y /d/b 1 x");
+    EXPECT_EQ(held({}), "");
 }
 
 TEST_P(CatalogueTest, ConfigurationIsReadBack)

@@ -1,6 +1,7 @@
 #pragma once
 
 #include "server/dimse/AssociationRules.h"
+#include "server/dimse/BreakSwitch.h"
 #include "server/dimse/DimseSettings.h"
 #include "server/dimse/RetrieveSender.h"
 
@@ -17,6 +18,7 @@ struct ProposedContext
 {
     QByteArray sopClass;
     QVector<QByteArray> syntaxes;
+    bool isProvided = false;  ///< by us, who tell of events; else the other side is asked to do something
 };
 
 /// What to propose so that the items from `index` on can be sent, as many of them as one association has room for: each
@@ -26,8 +28,9 @@ std::vector<ProposedContext> proposalsFor(const std::vector<RetrieveItem>& items
 /// Whether it is proposed to send the item as it is stored.
 bool isProposed(const std::vector<ProposedContext>& proposals, const RetrieveItem& item);
 
-/// An association with another application entity, asked for by us, to send objects to it. Used by one thread.
-class MoveAssociation
+/// An association with another application entity, asked for by us, to send it objects or tell it of events. Used by one
+/// thread.
+class OutgoingAssociation
 {
 public:
     struct Parties
@@ -39,14 +42,15 @@ public:
         std::chrono::seconds patience{30};
     };
 
-    /// Null, with the reason, when it cannot be had.
-    static std::unique_ptr<MoveAssociation>
-    open(const Parties& parties, const std::vector<ProposedContext>& proposals, Result& result);
+    /// Null, with the reason, when it cannot be had. The switch, which outlives it, breaks it off.
+    static std::unique_ptr<OutgoingAssociation> open(const Parties& parties,
+                                                     const std::vector<ProposedContext>& proposals,
+                                                     BreakSwitch& breakSwitch, Result& result);
 
     /// Releases it, or breaks it off.
-    ~MoveAssociation();
-    MoveAssociation(const MoveAssociation&) = delete;
-    MoveAssociation& operator=(const MoveAssociation&) = delete;
+    ~OutgoingAssociation();
+    OutgoingAssociation(const OutgoingAssociation&) = delete;
+    OutgoingAssociation& operator=(const OutgoingAssociation&) = delete;
 
     /// Nothing more can be said over it.
     void breakOff() { mIsBroken = true; }
@@ -60,9 +64,11 @@ public:
     bool receive(T_DIMSE_Message& message);
 
 private:
-    MoveAssociation() = default;
-    Result request(const Parties& parties, const std::vector<ProposedContext>& proposals);
+    OutgoingAssociation() = default;
+    Result request(const Parties& parties, const std::vector<ProposedContext>& proposals,
+                   BreakSwitch& breakSwitch);
 
+    std::unique_ptr<BreakableSocket> mSocket;  // the last to go
     T_ASC_Network* mNetwork = nullptr;
     T_ASC_Association* mAssociation = nullptr;
     std::chrono::seconds mPatience{0};

@@ -1,4 +1,4 @@
-#include "server/dimse/MoveAssociation.h"
+#include "server/dimse/OutgoingAssociation.h"
 
 #include "server/dicomweb/MediaTypes.h"
 
@@ -13,6 +13,7 @@
 
 #include <algorithm>
 #include <cstring>
+#include <functional>
 
 namespace Kdd::Dimse
 {
@@ -69,6 +70,12 @@ Result failure(const char* what, const OFCondition& condition)
         QStringLiteral("%1: %2").arg(QLatin1String(what), QString::fromLatin1(condition.text())));
 }
 
+void setOption(int socket, int option)
+{
+    const int yes = 1;
+    ::setsockopt(socket, IPPROTO_TCP, option, &yes, sizeof yes);
+}
+
 /// Of the many small messages none waits for another: neither ours until the last one was acknowledged, nor those of the
 /// other side until we acknowledge their heads.
 class PromptConnection : public DcmTCPConnection
@@ -81,53 +88,80 @@ public:
 
     ssize_t read(void* to, size_t size) override
     {
-        set(TCP_QUICKACK);
+        setOption(getSocket(), TCP_QUICKACK);
         return DcmTCPConnection::read(to, size);
     }
 
     OFBool networkDataAvailable(int timeout) override
     {
-        set(TCP_QUICKACK);
+        setOption(getSocket(), TCP_QUICKACK);
         return DcmTCPConnection::networkDataAvailable(timeout);
     }
-
-    void set(int option)
-    {
-        const int yes = 1;
-        ::setsockopt(getSocket(), IPPROTO_TCP, option, &yes, sizeof yes);
-    }
 };
+
+/// Tells of the socket as soon as there is one.
+using Connected = std::function<void(int socket)>;
 
 class PromptLayer : public DcmTransportLayer
 {
 public:
+    explicit PromptLayer(Connected connected)
+        : mConnected(std::move(connected))
+    {
+    }
+
     DcmTransportConnection* createConnection(DcmNativeSocketType socket, OFBool isSecure) override
     {
         if (isSecure)
             return nullptr;
-        auto* const connection = new PromptConnection(socket);
-        connection->set(TCP_NODELAY);
-        return connection;
+        setOption(socket, TCP_NODELAY);
+        mConnected(socket);
+        return new PromptConnection(socket);
     }
+
+private:
+    const Connected mConnected;
 };
 
-std::unique_ptr<DcmTLSTransportLayer> makeTls(const TlsRules& rules, Result& result)
+class SecureLayer : public DcmTLSTransportLayer
 {
-    auto layer = std::make_unique<DcmTLSTransportLayer>(NET_REQUESTOR, nullptr, OFFalse);
-    OFCondition condition = layer->setTLSProfile(TSP_Profile_BCP195_ND);
-    if (condition.good())
-        condition = layer->activateCipherSuites();
-    if (condition.good())
-        condition = layer->setPrivateKeyFile(rules.keyFile.constData(), DCF_Filetype_PEM);
-    if (condition.good())
-        condition = layer->setCertificateFile(rules.certificateFile.constData(), DCF_Filetype_PEM);
-    if (condition.good())
-        condition = layer->addTrustedCertificateFile(rules.caFile.constData(), DCF_Filetype_PEM);
-    layer->setCertificateVerification(DCV_requireCertificate);
-    if (condition.bad())
-        result = failure("TLS cannot be spoken", condition);
-    return condition.good() ? std::move(layer) : nullptr;
-}
+public:
+    explicit SecureLayer(Connected connected)
+        : DcmTLSTransportLayer(NET_REQUESTOR, nullptr, OFFalse)
+        , mConnected(std::move(connected))
+    {
+    }
+
+    /// Null when it cannot be spoken.
+    static std::unique_ptr<SecureLayer> make(const TlsRules& rules, const Connected& connected,
+                                             Result& result)
+    {
+        auto layer = std::make_unique<SecureLayer>(connected);
+        OFCondition condition = layer->setTLSProfile(TSP_Profile_BCP195_ND);
+        if (condition.good())
+            condition = layer->activateCipherSuites();
+        if (condition.good())
+            condition = layer->setPrivateKeyFile(rules.keyFile.constData(), DCF_Filetype_PEM);
+        if (condition.good())
+            condition = layer->setCertificateFile(rules.certificateFile.constData(), DCF_Filetype_PEM);
+        if (condition.good())
+            condition = layer->addTrustedCertificateFile(rules.caFile.constData(), DCF_Filetype_PEM);
+        layer->setCertificateVerification(DCV_requireCertificate);
+        if (condition.bad())
+            result = failure("TLS cannot be spoken", condition);
+        return condition.good() ? std::move(layer) : nullptr;
+    }
+
+    DcmTransportConnection* createConnection(DcmNativeSocketType socket, OFBool isSecure) override
+    {
+        setOption(socket, TCP_NODELAY);
+        mConnected(socket);
+        return DcmTLSTransportLayer::createConnection(socket, isSecure);
+    }
+
+private:
+    const Connected mConnected;
+};
 
 Result addContexts(T_ASC_Parameters& parameters, const std::vector<ProposedContext>& proposals)
 {
@@ -138,7 +172,8 @@ Result addContexts(T_ASC_Parameters& parameters, const std::vector<ProposedConte
             syntaxes.push_back(syntax.constData());
         const OFCondition added = ASC_addPresentationContext(
             &parameters, static_cast<T_ASC_PresentationContextID>(id), each.sopClass.constData(),
-            syntaxes.data(), static_cast<int>(syntaxes.size()));
+            syntaxes.data(), static_cast<int>(syntaxes.size()),
+            each.isProvided ? ASC_SC_ROLE_SCP : ASC_SC_ROLE_DEFAULT);
         if (added.bad())
             return failure("A class cannot be proposed", added);
         id += 2;
@@ -175,18 +210,25 @@ bool isProposed(const std::vector<ProposedContext>& proposals, const RetrieveIte
                        [&](const QByteArray& syntax) { return holds(proposals, item.sopClass, {syntax}); });
 }
 
-std::unique_ptr<MoveAssociation>
-MoveAssociation::open(const Parties& parties, const std::vector<ProposedContext>& proposals, Result& result)
+std::unique_ptr<OutgoingAssociation> OutgoingAssociation::open(const Parties& parties,
+                                                               const std::vector<ProposedContext>& proposals,
+                                                               BreakSwitch& breakSwitch, Result& result)
 {
-    std::unique_ptr<MoveAssociation> made(new MoveAssociation);
+    std::unique_ptr<OutgoingAssociation> made(new OutgoingAssociation);
     made->mPatience = parties.patience;
-    result = made->request(parties, proposals);
+    result = made->request(parties, proposals, breakSwitch);
     return result.good() ? std::move(made) : nullptr;
 }
 
-Result MoveAssociation::request(const Parties& parties, const std::vector<ProposedContext>& proposals)
+Result OutgoingAssociation::request(const Parties& parties, const std::vector<ProposedContext>& proposals,
+                                    BreakSwitch& breakSwitch)
 {
     Result result;
+    const auto connected = [&](int socket) {
+        mSocket = std::make_unique<BreakableSocket>(breakSwitch, socket);
+    };
+    if (breakSwitch.isBroken())
+        return Result::failure(QStringLiteral("The server stops"));
     if (parties.peer.host.size() > kLongestHost)
         return Result::failure(QStringLiteral("The name of its host is too long"));
     const auto seconds = static_cast<int>(mPatience.count());
@@ -194,12 +236,12 @@ Result MoveAssociation::request(const Parties& parties, const std::vector<Propos
     if (condition.bad())
         return failure("DCMTK cannot be made ready", condition);
     if (parties.tls) {
-        std::unique_ptr<DcmTLSTransportLayer> layer = makeTls(*parties.tls, result);
+        std::unique_ptr<SecureLayer> layer = SecureLayer::make(*parties.tls, connected, result);
         if (layer == nullptr)
             return result;
         ASC_setTransportLayer(mNetwork, layer.release(), 1);
     } else {
-        ASC_setTransportLayer(mNetwork, new PromptLayer, 1);
+        ASC_setTransportLayer(mNetwork, new PromptLayer(connected), 1);
     }
     T_ASC_Parameters* parameters = nullptr;
     condition = ASC_createAssociationParameters(&parameters, ASC_DEFAULTMAXPDU);
@@ -215,7 +257,8 @@ Result MoveAssociation::request(const Parties& parties, const std::vector<Propos
         return result;
     }
     mIsBroken = true;
-    condition = ASC_requestAssociation(mNetwork, parameters, &mAssociation, nullptr, nullptr, DUL_NOBLOCK, seconds);
+    condition =
+        ASC_requestAssociation(mNetwork, parameters, &mAssociation, nullptr, nullptr, DUL_NOBLOCK, seconds);
     if (condition.good()) {
         mIsBroken = false;
         return {};
@@ -226,7 +269,7 @@ Result MoveAssociation::request(const Parties& parties, const std::vector<Propos
     return failure("It gives no association", condition);
 }
 
-MoveAssociation::~MoveAssociation()
+OutgoingAssociation::~OutgoingAssociation()
 {
     if (mAssociation != nullptr) {
         if (!mIsBroken)
@@ -239,7 +282,7 @@ MoveAssociation::~MoveAssociation()
         ASC_dropNetwork(&mNetwork);
 }
 
-std::vector<SendContext> MoveAssociation::contexts() const
+std::vector<SendContext> OutgoingAssociation::contexts() const
 {
     std::vector<SendContext> contexts;
     const int count = ASC_countPresentationContexts(mAssociation->params);
@@ -253,7 +296,7 @@ std::vector<SendContext> MoveAssociation::contexts() const
     return contexts;
 }
 
-bool MoveAssociation::receive(T_DIMSE_Message& message)
+bool OutgoingAssociation::receive(T_DIMSE_Message& message)
 {
     T_ASC_PresentationContextID id = 0;
     DcmDataset* detail = nullptr;
