@@ -92,7 +92,8 @@ bool ElementWalk::read(qint64 at, qint64 end, bool isExplicit, Element& element)
                 return false;
             element.value = at + kLongHead;
         }
-        length = isLong ? qFromLittleEndian<quint32>(head + kShortHead) : qFromLittleEndian<quint16>(head + 6);
+        length =
+            isLong ? qFromLittleEndian<quint32>(head + kShortHead) : qFromLittleEndian<quint16>(head + 6);
         // What a writer did not understand it copied as it was: without VRs.
         element.isExplicit = !isVr(element, "UN");
     }

@@ -51,12 +51,12 @@ public:
     struct Element
     {
         DcmTagKey key;
-        char vr[2] = {0, 0};    ///< zero where it is not written
-        qint64 offset = 0;      ///< of its tag
-        qint64 value = 0;       ///< where its value begins
-        qint64 length = 0;      ///< of its value [bytes]
-        bool isOpen = false;    ///< its length is not told: a delimiter ends it
-        bool isExplicit = true; ///< whether VRs are written in its items
+        char vr[2] = {0, 0};     ///< zero where it is not written
+        qint64 offset = 0;       ///< of its tag
+        qint64 value = 0;        ///< where its value begins
+        qint64 length = 0;       ///< of its value [bytes]
+        bool isOpen = false;     ///< its length is not told: a delimiter ends it
+        bool isExplicit = true;  ///< whether VRs are written in its items
     };
 
     /// The element at an offset; false when none can be understood there that ends at `end` or before.
