@@ -1,4 +1,5 @@
 #include "server/dimse/DimseFixture.h"
+#include "server/dimse/OnlyPatient.h"
 
 #include <thread>
 
@@ -89,6 +90,25 @@ TEST_F(DimseStore, TellsByTheStatusWhatBecameOfAnObject)
     EXPECT_EQ(caller.store(UID_CTImageStorage, "1.2.3.2", bytesOf(anImage("1.2.3.2"))), 0x0122);
     EXPECT_EQ(caller.store(kCapture, "1.2.3.2", bytesOf(anImage("1.2.3.2"))), 0) << "the association goes on";
     EXPECT_EQ(instances(), 2);
+    EXPECT_EQ(storedFiles().size(), 2);
+}
+
+TEST_F(DimseStore, TakesOfALimitedPeerWhatItMaySee)
+{
+    mSettings.dimse->rules.peers.insert("LIMITED", {{}, {}, 0, false, Dimse::kAllRights, onlyPatient("P1")});
+    start();
+    ASSERT_EQ(store(anImage().inStudy("1.9").with(DCM_PatientID, "P2")), 0);
+    ASSERT_EQ(instances("1.9"), 1) << "it is complete, and so known as that patient's";
+    RawCaller caller(mServer->dimseAddress());
+    caller.associate({{kCapture, {kExplicit}}}, "KDD", "LIMITED");
+    const auto send = [&](const char* uid, const char* study, const char* patient) {
+        const DatasetBuilder image = anImage(uid).inStudy(study).with(DCM_PatientID, patient);
+        return caller.store(kCapture, uid, bytesOf(image));
+    };
+    EXPECT_EQ(send("1.2.3.2", "1.2", "P1"), 0);
+    EXPECT_EQ(send("1.2.3.3", "1.2", "P2"), 0x0124);
+    EXPECT_EQ(send("1.2.3.4", "1.9", "P1"), 0x0124) << "it would join a study that it may not see";
+    EXPECT_EQ(send("1.2.3.1", "1.9", "P2"), 0x0124) << "nor is it told that this is there";
     EXPECT_EQ(storedFiles().size(), 2);
 }
 

@@ -50,4 +50,30 @@ TEST_F(DimseTls, TakesThoseWhoseCertificatesAreGood)
     EXPECT_EQ(instances(), 1);
 }
 
+TEST_F(DimseTls, ShowsTheCertificateThatWasReadLast)
+{
+    const TlsFiles used;
+    const auto take = [&](const TlsFiles& files) {
+        QFile::remove(text(used.certificate()));
+        QFile::remove(text(used.key()));
+        return QFile::copy(text(files.certificate()), text(used.certificate())) &&
+               QFile::copy(text(files.key()), text(used.key()));
+    };
+    const auto isShown = [&](const TlsFiles& files) {
+        return run("echoscu", {QStringLiteral("+tla"), QStringLiteral("+cf"), text(files.certificate())})
+                   .exitCode == 0;
+    };
+    ASSERT_TRUE(take(mServerFiles));
+    mSettings.dimse->tls = {used.certificate(), used.key(), {}, false};
+    start();
+    EXPECT_TRUE(isShown(mServerFiles));
+    ASSERT_TRUE(take(mPeerFiles));
+    EXPECT_TRUE(mServer->renewCertificate().good());
+    EXPECT_FALSE(isShown(mServerFiles));
+    EXPECT_TRUE(isShown(mPeerFiles));
+    QFile::remove(text(used.key()));
+    EXPECT_TRUE(mServer->renewCertificate().bad());
+    EXPECT_TRUE(isShown(mPeerFiles)) << "the former one stays";
+}
+
 }  // namespace

@@ -36,6 +36,14 @@ TEST(PeersFileTest, IsRefusedForEverySlipWithItsPlace)
          "tls.caFile is needed"},
         {R"({"peers": {"WS1": {"rights": ["query"], "host": "ws1", "port": 104, "tls": true}}})",
          "tls.caFile is needed"},
+        {R"({"peers": {"WS1": {"rights": ["query"], "studies": {}}}})", "peers.WS1.studies is no object"},
+        {R"({"peers": {"WS1": {"rights": ["query"], "studies": {"PixelData": "A"}}}})", "are not kept apart"},
+        {R"({"peers": {"WS1": {"rights": ["query"], "studies": {"PatientID": []}}}})", "without values"},
+        {R"({"peers": {"WS1": {"rights": ["query"], "studies": {"PatientID": 7}}}})", "that is no text"},
+        {R"({"anyone": [], "peers": {"WS1": {"rights": ["query"], "studies": {"PatientID": "A", "Foo": "B"}}}})",
+         "are not kept apart"},
+        {R"({"anyone": ["store"], "peers": {"WS1": {"rights": ["query"], "studies": {"PatientID": "A"}}}})",
+         "no rights for anyone"},
         {R"({"anyone": ["store"], "unknownClasses": 1})", "unknownClasses is neither true nor false"},
     };
     for (const auto& slip : kSlips) {

@@ -35,6 +35,12 @@ QByteArray item(char kind, const QByteArray& content)
     return QByteArray(1, kind) + '\0' + big(static_cast<quint16>(content.size())) + content;
 }
 
+/// With its length before it.
+QByteArray command(const QByteArray& elements)
+{
+    return QByteArray(4, 0) + little<quint32>(4) + little(static_cast<quint32>(elements.size())) + elements;
+}
+
 }  // namespace
 
 RawCaller::RawCaller(const QByteArray& address)
@@ -97,7 +103,13 @@ QByteArray RawCaller::storeCommand(const QByteArray& sopClass, const QByteArray&
 {
     const QByteArray elements = text(0x0002, sopClass) + number(0x0100, 1) + number(0x0110, 7) +
                                 number(0x0700, 0) + number(0x0800, 0) + text(0x1000, instance);
-    return QByteArray(4, 0) + little<quint32>(4) + little(static_cast<quint32>(elements.size())) + elements;
+    return command(elements);
+}
+
+QByteArray RawCaller::actionCommand()
+{
+    return command(text(0x0003, "1.2.840.10008.1.20.1") + number(0x0100, 0x0130) + number(0x0110, 7) +
+                   number(0x0800, 0) + text(0x1001, "1.2.840.10008.1.20.1.1") + number(0x1008, 1));
 }
 
 void RawCaller::send(const QByteArray& bytes) const

@@ -36,6 +36,9 @@ public:
     static QByteArray text(quint16 element, QByteArray value);
     static QByteArray storeCommand(const QByteArray& sopClass, const QByteArray& instance);
 
+    /// Asks for storage commitment.
+    static QByteArray actionCommand();
+
     void send(const QByteArray& bytes) const;
 
     /// The next PDU with its head; empty when the connection has ended.

@@ -37,6 +37,7 @@ protected:
         const QJsonObject told = QJsonDocument::fromJson(mServer->readLine()).object();
         mAddress = told.value(QLatin1String("address")).toString().toLatin1();
         mStatus = told.value(QLatin1String("status")).toString().toLatin1();
+        mDicom = told.value(QLatin1String("dicom")).toString().toLatin1();
     }
 
     void signal(int number) const { ::kill(static_cast<pid_t>(mServer->processId()), number); }
@@ -116,6 +117,7 @@ protected:
     std::unique_ptr<QProcess> mServer;
     QByteArray mAddress;
     QByteArray mStatus;
+    QByteArray mDicom;  // where it has associations
 };
 
 }  // namespace Kdd

@@ -62,6 +62,51 @@ protected:
         ASSERT_TRUE(mServer->start().good());
     }
 
+    quint16 port() const
+    {
+        const QByteArray dicom = mServer->dimseAddress();
+        return dicom.mid(dicom.lastIndexOf(':') + 1).toUShort();
+    }
+
+    static bool isListening(quint16 port)
+    {
+        sockaddr_in at = {};
+        at.sin_family = AF_INET;
+        at.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+        at.sin_port = htons(port);
+        const int socket = ::socket(AF_INET, SOCK_STREAM, 0);
+        const bool isThere = ::connect(socket, reinterpret_cast<sockaddr*>(&at), sizeof at) == 0;
+        ::close(socket);
+        return isThere;
+    }
+
+    /// Two images of one series and one of another, of one patient, and one of another patient.
+    void fill()
+    {
+        store("a",
+              anImage("1.1.1").inStudy("1").inSeries("1.1").with(DCM_PatientID, "P1").words({1, 2, 3, 4}));
+        store("b",
+              anImage("1.1.2").inStudy("1").inSeries("1.1").with(DCM_PatientID, "P1").words({5, 6, 7, 8}));
+        store("c", anImage("1.2.1").inStudy("1").inSeries("1.2").with(DCM_PatientID, "P1"));
+        store("d", anImage("2.1.1").inStudy("2").inSeries("2.1").with(DCM_PatientID, "P2"));
+        add();
+        start();
+    }
+
+    std::string getStudy(const char* uid, const QStringList& more = {})
+    {
+        return get({QStringLiteral("QueryRetrieveLevel=STUDY"),
+                    QStringLiteral("StudyInstanceUID=") + QLatin1String(uid)},
+                   more);
+    }
+
+    std::string moveStudy(const char* uid, const QStringList& more = {}, const char* to = "SELF")
+    {
+        return move({QStringLiteral("QueryRetrieveLevel=STUDY"),
+                     QStringLiteral("StudyInstanceUID=") + QLatin1String(uid)},
+                    more, to);
+    }
+
     /// Starts a tool; `keys` as "PatientName=D*".
     std::unique_ptr<QProcess> begin(const char* tool, const QStringList& options, const QStringList& keys,
                                     const QStringList& files = {})
@@ -170,10 +215,10 @@ protected:
     ServerSettings mSettings;
     quint16 mSelf = 0;
     QString mAnswers;
+    std::unique_ptr<Server> mServer;
 
 private:
     int mRuns = 0;
-    std::unique_ptr<Server> mServer;
 };
 
 /// "STUDY" and the keys that ask on that level.

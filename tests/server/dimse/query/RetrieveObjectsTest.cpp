@@ -14,19 +14,6 @@ const char* const kBitByBit = "+B";
 class RetrieveObjects : public QueriedArchive
 {
 protected:
-    /// Two images of one series and one of another.
-    void fill()
-    {
-        store("a",
-              anImage("1.1.1").inStudy("1").inSeries("1.1").with(DCM_PatientID, "P1").words({1, 2, 3, 4}));
-        store("b",
-              anImage("1.1.2").inStudy("1").inSeries("1.1").with(DCM_PatientID, "P1").words({5, 6, 7, 8}));
-        store("c", anImage("1.2.1").inStudy("1").inSeries("1.2").with(DCM_PatientID, "P1"));
-        store("d", anImage("2.1.1").inStudy("2").inSeries("2.1").with(DCM_PatientID, "P2"));
-        add();
-        start();
-    }
-
     /// As `kdd qa` does; with `oldStudy` the image comes from there.
     void correct(const char* study, const char* image, const char* oldStudy, const char* tag,
                  const char* value)
@@ -39,16 +26,6 @@ protected:
         job.close();
         kdd({QStringLiteral("qa"), path("job.xml"), QStringLiteral("--study"), QString::fromLatin1(study),
              QStringLiteral("--image"), QString::fromLatin1(image)});
-    }
-
-    std::string getStudy(const char* uid, const QStringList& more = {})
-    {
-        return get(onLevel("STUDY", {QStringLiteral("StudyInstanceUID=") + QLatin1String(uid)}), more);
-    }
-
-    std::string moveStudy(const char* uid, const QStringList& more = {}, const char* to = "SELF")
-    {
-        return move(onLevel("STUDY", {QStringLiteral("StudyInstanceUID=") + QLatin1String(uid)}), more, to);
     }
 };
 
@@ -214,18 +191,6 @@ TEST_P(RetrieveObjects, EndsWhenItIsCancelled)
     EXPECT_THAT(moveStudy("7", {QStringLiteral("--cancel"), QStringLiteral("1")}),
                 HasSubstr("Cancel: SubOperationsTerminatedDueToCancelIndication"));
     EXPECT_LT(answers().size(), 60U);
-}
-
-bool isListening(quint16 port)
-{
-    sockaddr_in at = {};
-    at.sin_family = AF_INET;
-    at.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-    at.sin_port = htons(port);
-    const int socket = ::socket(AF_INET, SOCK_STREAM, 0);
-    const bool isThere = ::connect(socket, reinterpret_cast<sockaddr*>(&at), sizeof at) == 0;
-    ::close(socket);
-    return isThere;
 }
 
 TEST_P(RetrieveObjects, TellsWhatADestinationTookThatDied)

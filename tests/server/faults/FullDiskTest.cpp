@@ -1,0 +1,133 @@
+#include "server/dimse/RawCaller.h"
+#include "server/faults/Served.h"
+
+#include <QDirIterator>
+#include <QtEndian>
+
+#include <dcmtk/dcmdata/dcuid.h>
+#include <sys/statvfs.h>
+
+using namespace Kdd;
+
+namespace
+{
+
+const QByteArray kCapture = UID_SecondaryCaptureImageStorage;
+
+/// A server whose store has a small file system of its own, which nobody else sees.
+class FullDisk : public Served
+{
+protected:
+    void SetUp() override
+    {
+        Served::SetUp();
+        QProcess probe;
+        probe.start(QStringLiteral("unshare"), {QStringLiteral("-rm"), QStringLiteral("true")});
+        if (!probe.waitForFinished(kTimeout) || probe.exitCode() != 0)
+            GTEST_SKIP() << "the system gives no file systems of one's own";
+        QFile script(path("mounted"));
+        ASSERT_TRUE(script.open(QIODevice::WriteOnly));
+        script.write("#!/bin/sh\nmount -t tmpfs -o size=16m none " + path("store").toUtf8() +
+                     " && exec \"$@\"\n");
+        script.setPermissions(QFile::ReadOwner | QFile::WriteOwner | QFile::ExeOwner);
+        script.close();
+        QDir().mkpath(path("store"));
+        serve({QStringLiteral("--stow"), QStringLiteral("--dicom"), QStringLiteral("127.0.0.1:0")}, "",
+              ("unshare -rm " + path("mounted").toUtf8()).constData());
+    }
+
+    /// Below the server's own disk.
+    QString onDisk(const char* name) const
+    {
+        return QStringLiteral("/proc/%1/root").arg(mServer->processId()) + path("store/") +
+               QLatin1String(name);
+    }
+
+    /// Leaves so many bytes.
+    void fill(qint64 left)
+    {
+        struct statvfs disk = {};
+        ASSERT_EQ(::statvfs(onDisk("").toUtf8().constData(), &disk), 0);
+        QFile ballast(onDisk("ballast"));
+        ASSERT_TRUE(ballast.open(QIODevice::WriteOnly | QIODevice::Append | QIODevice::Unbuffered));
+        const qint64 free = static_cast<qint64>(disk.f_bavail * disk.f_bsize);
+        ballast.write(QByteArray(static_cast<int>(std::max<qint64>(0, free - left)), 'b'));
+    }
+    void giveRoom() const { QFile::remove(onDisk("ballast")); }
+
+    QByteArray fileOf(const QByteArray& uid, int words)
+    {
+        save(uid.constData(), anImage(uid.constData()).words(std::vector<Uint16>(std::size_t(words), 7)));
+        return fileContent(file(uid.constData()));
+    }
+
+    int stow(const QByteArray& content) const
+    {
+        Client client(mAddress);
+        client.send(
+            "POST /dicom-web/studies HTTP/1.1\r\nHost: localhost\r\nContent-Type: application/dicom\r\n"
+            "Content-Length: " +
+            QByteArray::number(content.size()) + "\r\n\r\n" + content);
+        return client.reply().status;
+    }
+
+    int associate(const QByteArray& uid, const QByteArray& content) const
+    {
+        constexpr int kToLength = 140;
+        RawCaller caller(mDicom);
+        caller.associate({{kCapture, {UID_LittleEndianExplicitTransferSyntax}}});
+        return caller.store(
+            kCapture, uid,
+            content.mid(kToLength + 4 + qFromLittleEndian<qint32>(content.constData() + kToLength)));
+    }
+
+    int found() const { return QJsonDocument::fromJson(get("studies/1.2/instances").body).array().size(); }
+
+    const Setting mWatermark{"KDD_FREE_SPACE", "0"};
+
+    int filesBelow(const char* folder) const
+    {
+        int count = 0;
+        QDirIterator files(onDisk(folder), QDir::Files | QDir::Hidden, QDirIterator::Subdirectories);
+        for (; files.hasNext(); files.next())
+            ++count;
+        return count;
+    }
+};
+
+TEST_F(FullDisk, RefusesAnObjectForWhichThereIsNoRoomAndGoesOnWhenThereIs)
+{
+    const QByteArray large = fileOf("1.2.3.1", 500000);
+    EXPECT_EQ(stow(fileOf("1.2.3.2", 4)), 200);
+    const int before = filesBelow("objects");
+    fill(400000);
+    for (int i = 0; i < 3; ++i) {
+        EXPECT_EQ(stow(large), 503);
+        EXPECT_EQ(associate("1.2.3.1", large), 0xA700);
+        EXPECT_EQ(filesBelow("objects"), before) << "nothing of it is left";
+    }
+    EXPECT_EQ(found(), 1);
+    giveRoom();
+    EXPECT_EQ(associate("1.2.3.1", large), 0);
+    EXPECT_EQ(stow(large), 200) << "which is there";
+    EXPECT_EQ(found(), 2);
+    EXPECT_EQ(end(), 0);
+}
+
+TEST_F(FullDisk, TellsTheTruthWhereverTheRoomEnds)
+{
+    int stored = 0;
+    for (int i = 0; i < 24; ++i) {
+        fill(4096 * (i / 2));
+        const QByteArray uid = "1.2.3." + QByteArray::number(100 + i);
+        const QByteArray content = fileOf(uid, 3000);
+        const bool isTold = i % 2 == 0 ? stow(content) == 200 : associate(uid, content) == 0;
+        giveRoom();
+        EXPECT_EQ(found(), stored + (isTold ? 1 : 0)) << i;
+        EXPECT_EQ(i % 2 == 0 ? stow(content) : associate(uid, content), i % 2 == 0 ? 200 : 0) << i;
+        EXPECT_EQ(found(), ++stored) << i;
+    }
+    EXPECT_EQ(end(), 0);
+}
+
+}  // namespace
