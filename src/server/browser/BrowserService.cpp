@@ -111,8 +111,13 @@ Http::Response BrowserService::lookAt(const QByteArray& uid, const Look& look) c
     if (arrivals != nullptr)
         arrivals->bringInOwn(uid);
     DicomWeb::Presence presence = mShelf.find(uid, study);
-    if (presence == DicomWeb::Presence::Absent && arrivals != nullptr && arrivals->bringIn(uid))
-        presence = mShelf.find(uid, study);
+    if (presence == DicomWeb::Presence::Absent && arrivals != nullptr) {
+        const DicomWeb::Arrived arrived = arrivals->bringIn(uid);
+        if (arrived == DicomWeb::Arrived::Brought)
+            presence = mShelf.find(uid, study);
+        else if (arrived == DicomWeb::Arrived::Waiting)
+            presence = DicomWeb::Presence::Held;
+    }
     if (presence != DicomWeb::Presence::Found)
         return notThere(presence);
     return study->look([&](const TagFile& file) { return look(file, study->version()); });

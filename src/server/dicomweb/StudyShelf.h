@@ -50,14 +50,21 @@ enum class Presence {
     Damaged,  ///< told in the log
 };
 
+/// What became of images that have arrived.
+enum class Arrived {
+    Nothing,  ///< none wait
+    Brought,  ///< the tag file may show more now
+    Waiting,  ///< they could not be brought in now: what is not found may be there all the same
+};
+
 /// Images that have arrived and are not in their tag files yet. Called on several threads at the same time.
 class Arrivals
 {
 public:
     virtual ~Arrivals() = default;
 
-    /// Brings in what has arrived of the study, whichever server took it. True when its tag file may show more now.
-    virtual bool bringIn(const QByteArray& studyUID) = 0;
+    /// Brings in what has arrived of the study, whichever server took it.
+    virtual Arrived bringIn(const QByteArray& studyUID) = 0;
 
     /// Brings in what this server has taken: of the study, or of all studies when that is empty.
     virtual void bringInOwn(const QByteArray& studyUID) = 0;

@@ -94,8 +94,8 @@ Http::Response CorrectionBody::correct()
 {
     const QByteArray from = mJob.oldStudyUID.isEmpty() ? mJob.studyUID : mJob.oldStudyUID;
     // What was told as stored a moment ago can be corrected.
-    if (mStudies.arrivals() != nullptr)
-        mStudies.arrivals()->bringIn(from);
+    const Arrived arrived =
+        mStudies.arrivals() != nullptr ? mStudies.arrivals()->bringIn(from) : Arrived::Nothing;
     const int patience = mTurns.rules().patienceMs();
     const Result result =
         mOrder.isPreview ? StudyChange::preview(mJob, patience) : StudyChange::correct(mJob, patience);
@@ -105,6 +105,8 @@ Http::Response CorrectionBody::correct()
     QSet<QByteArray> missing(mJob.images.cbegin(), mJob.images.cend());
     missing.intersect(QSet<QByteArray>(outcome.notFound.cbegin(), outcome.notFound.cend()));
     const bool hasImages = outcome.asked > missing.size();
+    if (!hasImages && arrived == Arrived::Waiting)
+        return studyIsBusy();
     Http::Response response = Http::textResponse(hasImages ? 200 : 404, "application/json",
                                                  correctionReport(mJob, mOrder.root, mOrder.isPreview));
     response.addHeader("Cache-Control", "no-store");

@@ -68,9 +68,11 @@ Http::Response MetadataResource::answer(const Http::Request& request, const Reso
         arrivals->bringInOwn(path.study);
     Http::Response response = look(request, metadata);
     // What is asked for may have arrived at another server a moment ago.
-    if (response.status == 404 && arrivals != nullptr && arrivals->bringIn(path.study))
+    const Arrived arrived =
+        response.status == 404 && arrivals != nullptr ? arrivals->bringIn(path.study) : Arrived::Nothing;
+    if (arrived == Arrived::Brought)
         response = look(request, metadata);
-    return response;
+    return arrived == Arrived::Waiting ? notThere(Presence::Held) : std::move(response);
 }
 
 Http::Response MetadataResource::look(const Http::Request& request, const MetadataRequest& metadata)

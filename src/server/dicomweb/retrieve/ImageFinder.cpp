@@ -24,8 +24,13 @@ Verdict findStudy(StudyShelf& shelf, const ResourcePath& path, std::shared_ptr<c
     Presence presence = shelf.find(path.study, study);
     // What is asked for may have arrived a moment ago.
     const bool mayHaveArrived = presence == Presence::Absent || (study != nullptr && !shows(*study, path));
-    if (mayHaveArrived && shelf.arrivals() != nullptr && shelf.arrivals()->bringIn(path.study))
-        presence = shelf.find(path.study, study);
+    if (mayHaveArrived && shelf.arrivals() != nullptr) {
+        const Arrived arrived = shelf.arrivals()->bringIn(path.study);
+        if (arrived == Arrived::Brought)
+            presence = shelf.find(path.study, study);
+        else if (arrived == Arrived::Waiting)
+            presence = Presence::Held;
+    }
     switch (presence) {
     case Presence::Found:
         return {};

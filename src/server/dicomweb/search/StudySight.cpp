@@ -25,10 +25,12 @@ Sight StudySight::look(const Limits& limits, const QByteArray& studyUID) const
     std::vector<Kxg::FoundStudy> found;
     Result result = find(limits, studyUID, found);
     // By what it is known may have arrived a moment ago.
-    if (result.good() && found.empty() && mShelf.arrivals() != nullptr &&
-        mShelf.arrivals()->bringIn(studyUID))
+    Arrived arrived = Arrived::Nothing;
+    if (result.good() && found.empty() && mShelf.arrivals() != nullptr)
+        arrived = mShelf.arrivals()->bringIn(studyUID);
+    if (arrived == Arrived::Brought)
         result = find(limits, studyUID, found);
-    if (result.bad())
+    if (result.bad() || arrived == Arrived::Waiting)
         return Sight::Unknown;
     return found.empty() ? Sight::Hidden : Sight::Seen;
 }

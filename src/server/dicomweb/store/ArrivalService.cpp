@@ -100,7 +100,7 @@ Result ArrivalService::complete(const QByteArray& studyUID, int patienceMs)
         [&](Kxg::Catalogue& catalogue) { return mStudies.complete(studyUID, catalogue, patienceMs); });
 }
 
-bool ArrivalService::bringIn(const QByteArray& studyUID)
+Arrived ArrivalService::bringIn(const QByteArray& studyUID)
 {
     const QByteArray folder = mStore->rules().folder + '/' + studyUID;
     // Asked in any case: another server may have taken it.
@@ -115,8 +115,10 @@ bool ArrivalService::bringIn(const QByteArray& studyUID)
             mStudies.addWaiting(studyUID);
         return asked;
     });
-    return result.good() && mStudies.isWaiting(studyUID) &&
-           complete(studyUID, ExResource::readPatience()).good();
+    if (result.good() && !mStudies.isWaiting(studyUID))
+        return Arrived::Nothing;
+    return result.good() && complete(studyUID, ExResource::readPatience()).good() ? Arrived::Brought
+                                                                                  : Arrived::Waiting;
 }
 
 void ArrivalService::bringInOwn(const QByteArray& studyUID)

@@ -33,7 +33,7 @@ public:
     ObjectStore& store() { return *mStore; }
     const ThreadCatalogue& database() const { return mDatabase; }
 
-    bool bringIn(const QByteArray& studyUID) override;
+    Arrived bringIn(const QByteArray& studyUID) override;
     void bringInOwn(const QByteArray& studyUID) override;
 
 private:
