@@ -59,6 +59,13 @@ private:
     std::mt19937 mRandom{7};
 };
 
+/// One has nearly all studies, one a hundredth, one ten.
+QByteArray institution(int number)
+{
+    const char* const name = number % 10000 == 0 ? "Tiny" : number % 100 == 0 ? "Small" : "Great";
+    return QByteArray(R"({"Value":[")") + name + R"("],"vr":"LO"})";
+}
+
 StudySearchRecord madeUp(People& people, int number)
 {
     static const std::array<const char*, 20> kModalities = {"CT", "CT", "CT", "CT", "CT", "CR", "CR",
@@ -87,7 +94,8 @@ StudySearchRecord madeUp(People& people, int number)
         series.modality = modality;
         series.number = QByteArray::number(i);
         series.instances = 100;
-        series.attributes = QByteArray("0008103E{\"vr\":\"LO\",\"Value\":[\"made up\"]}\n").repeated(10);
+        series.attributes = "00080080" + institution(number) + '\n' +
+                            QByteArray("0008103E{\"vr\":\"LO\",\"Value\":[\"made up\"]}\n").repeated(10);
         study.series.push_back(series);
     }
     return study;
@@ -157,7 +165,10 @@ SearchTerm dates(const char* from, const char* to)
     return term;
 }
 
-void run(benchmark::State& state, const std::vector<SearchTerm>& terms, int offset, SearchColumn order)
+using Limits = std::shared_ptr<const StudyLimits>;
+
+void run(benchmark::State& state, const std::vector<SearchTerm>& terms, int offset, SearchColumn order,
+         const Limits& limits)
 {
     SearchQuery query;
     query.terms = terms;
@@ -166,6 +177,7 @@ void run(benchmark::State& state, const std::vector<SearchTerm>& terms, int offs
     if (order != SearchColumn::StudyDate)
         query.order = {{order, false}};
     StudySearch& search = archive();
+    search.limitTo(limits);
     QByteArray plan;
     if (qEnvironmentVariableIsSet("KDD_BENCH_PLANS") && search.explainStudies(query, plan).good())
         std::fprintf(stderr, "%s\n", plan.constData());
@@ -181,9 +193,26 @@ void run(benchmark::State& state, const std::vector<SearchTerm>& terms, int offs
 }
 
 void declare(const char* what, const std::vector<SearchTerm>& terms, int offset = 0,
-             SearchColumn order = SearchColumn::StudyDate)
+             SearchColumn order = SearchColumn::StudyDate, const Limits& limits = nullptr)
 {
-    benchmark::RegisterBenchmark(what, run, terms, offset, order)->Unit(benchmark::kMillisecond);
+    benchmark::RegisterBenchmark(what, run, terms, offset, order, limits)->Unit(benchmark::kMillisecond);
+}
+
+/// Of those who may see the studies of some institutions only.
+void declareLimited(const QByteArray& who, const QVector<int>& numbers)
+{
+    StudyLimit limit{StudyLimit::Of::Series, "00080080", {}};
+    for (const int number : numbers)
+        limit.values << "00080080" + institution(number);
+    const auto limits = std::make_shared<StudyLimits>(StudyLimits{{limit}});
+    declare(("limited" + who + "/newest").constData(), {}, 0, SearchColumn::StudyDate, limits);
+    declare(("limited" + who + "/namePart").constData(), {name("*sch*")}, 0, SearchColumn::StudyDate, limits);
+    declare(("limited" + who + "/modality").constData(), {is(SearchColumn::ModalitiesInStudy, "MR")}, 0,
+            SearchColumn::StudyDate, limits);
+    declare(("limited" + who + "/identifier").constData(), {is(SearchColumn::PatientID, "PID4711")}, 0,
+            SearchColumn::StudyDate, limits);
+    declare(("limited" + who + "/one").constData(), {is(SearchColumn::StudyUID, "1.2.3.4711")}, 0,
+            SearchColumn::StudyDate, limits);
 }
 
 const bool kDeclared = [] {
@@ -206,6 +235,11 @@ const bool kDeclared = [] {
     declare("search/modalityAndName", {is(SearchColumn::ModalitiesInStudy, "MR"), name("*sch*")});
     declare("search/byName", {}, 0, SearchColumn::PatientName);
     declare("search/byPatientID", {}, 5000, SearchColumn::PatientID);
+    declare("search/one", {is(SearchColumn::StudyUID, "1.2.3.4711")});
+    declareLimited("ToGreat", {1});
+    declareLimited("ToSmall", {100});
+    declareLimited("ToTiny", {0});
+    declareLimited("ToNone", {});
     return true;
 }();
 

@@ -187,6 +187,17 @@ const QStringList kSteps[] = {
                        " (modality, study_date DESC, study_time DESC, uid{also}study_id, name_words)"),
         QStringLiteral("{names of modalities}"),
     },
+    {
+        // By what those who may see some studies only find theirs in a list; a star: nobody has looked yet.
+        QStringLiteral("ALTER TABLE study_search ADD COLUMN marks {text} NOT NULL DEFAULT '*'"),
+        QStringLiteral("ALTER TABLE study_modality ADD COLUMN marks {text} NOT NULL DEFAULT '*'"),
+        QStringLiteral("DROP INDEX study_search_by_date"),
+        QStringLiteral("CREATE INDEX study_search_by_date ON study_search"
+                       " (study_date DESC, study_time DESC, uid{also}study_id, name_words, marks)"),
+        QStringLiteral("DROP INDEX study_modality_by_date"),
+        QStringLiteral("CREATE INDEX study_modality_by_date ON study_modality"
+                       " (modality, study_date DESC, study_time DESC, uid{also}study_id, name_words, marks)"),
+    },
 };
 
 QString firstRow(SqlConnection& connection, const QString& question)

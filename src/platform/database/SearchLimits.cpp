@@ -1,6 +1,7 @@
 #include "platform/database/SearchLimits.h"
 
 #include "platform/database/SqlConnection.h"
+#include "platform/database/StudyMarks.h"
 
 namespace Kxg
 {
@@ -24,6 +25,19 @@ QVariantList textsOf(const StudyLimit& limit)
     return list;
 }
 
+/// Leaves out, without a look at what they say, most of the studies that are not meant.
+SearchSql marksSql(SearchSelection& selection, const SqlDialect& dialect, const StudyLimit& limit)
+{
+    const QByteArray marks = selection.study("marks");
+    SearchSql any{'(' + marks + " = ?", {textValue(kAnyMark)}};
+    for (const QByteArray& line : limit.values) {
+        any.text += " OR " + dialect.wordsOf.arg(QLatin1String(marks)).toLatin1();
+        any.values << textValue(dialect.pattern('*' + markOf(line) + '*'));
+    }
+    any.text += ')';
+    return any;
+}
+
 void addLimit(SearchSelection& selection, const SqlDialect& dialect, const StudyLimit& limit)
 {
     if (limit.values.isEmpty())
@@ -32,6 +46,8 @@ void addLimit(SearchSelection& selection, const SqlDialect& dialect, const Study
     if (limit.of == StudyLimit::Of::Uid)
         return selection.add(
             {selection.study("uid") + " IN (?" + QByteArray(", ?").repeated(further) + ')', textsOf(limit)});
+    if (isMarked(limit.attribute))
+        selection.add(marksSql(selection, dialect, limit));
     const QByteArray holds = dialect.holds.arg(QLatin1String("l.attributes")).toLatin1();
     const QByteArray holdsOne = '(' + holds + (" OR " + holds).repeated(further) + ')';
     const QByteArray ofStudy = " l WHERE l.study_id = " + selection.study("study_id") + " AND ";

@@ -2,6 +2,7 @@
 
 #include "platform/database/SearchText.h"
 #include "platform/database/SqlConnection.h"
+#include "platform/database/StudyMarks.h"
 
 #include <QJsonArray>
 #include <QJsonDocument>
@@ -91,15 +92,16 @@ void put(SqlConnection& connection, qint64 studyId, const StudySearchRecord& stu
     if (connection.change(
             "INSERT INTO study_search (study_id, uid, is_built, file_size, file_modified, digest,"
             " study_date, study_time, accession_number, patient_id, patient_birth_date,"
-            " patient_sex, study_code, sort_name, name_words, modalities, series_count, instance_count)"
+            " patient_sex, study_code, sort_name, name_words, modalities, marks,"
+            " series_count, instance_count)"
             " SELECT id, uid, CAST(? AS SMALLINT), CAST(? AS BIGINT), CAST(? AS BIGINT), ?, ?, ?,"
-            " ?, ?, ?, ?, ?, ?, ?, ?, CAST(? AS BIGINT), CAST(? AS BIGINT) FROM study WHERE id = ?",
+            " ?, ?, ?, ?, ?, ?, ?, ?, ?, CAST(? AS BIGINT), CAST(? AS BIGINT) FROM study WHERE id = ?",
             {isBuilt ? 1 : 0, tagFile.fileSize, tagFile.modified, bytesValue(tagFile.digest),
              textValue(study.date), textValue(study.time), indexedValue(study.accessionNumber),
              indexedValue(study.patientID), textValue(study.patientBirthDate), textValue(study.patientSex),
              indexedValue(study.studyID), indexedValue(sortName(QString::fromUtf8(study.patientName))),
              indexedValue(names(study.patientName)), textValue(modalities.join('\\')),
-             static_cast<qint64>(study.series.size()), instances, studyId}) == 0)
+             textValue(marksOf(study)), static_cast<qint64>(study.series.size()), instances, studyId}) == 0)
         return;
     connection.change("INSERT INTO study_answer (study_id, attributes) VALUES (?, ?)",
                       {studyId, bytesValue(study.attributes)});
@@ -111,9 +113,9 @@ void put(SqlConnection& connection, qint64 studyId, const StudySearchRecord& stu
          textValue(words(study.accessionNumber)), textValue(words(study.studyID))});
     for (const QByteArray& modality : modalities)
         connection.change(
-            "INSERT INTO study_modality (modality, study_date, study_time, uid, study_id, name_words)"
-            " SELECT CAST(? AS TEXT), study_date, study_time, uid, study_id, name_words FROM study_search"
-            " WHERE study_id = ?",
+            "INSERT INTO study_modality (modality, study_date, study_time, uid, study_id, name_words, marks)"
+            " SELECT CAST(? AS TEXT), study_date, study_time, uid, study_id, name_words, marks"
+            " FROM study_search WHERE study_id = ?",
             {textValue(modality), studyId});
     for (const SeriesSearchRecord& series : study.series)
         putSeries(connection, studyId, series);
@@ -297,6 +299,26 @@ void putRegisteredRows(SqlConnection& connection, qint64 studyId)
         putCounts(connection, studyId, study);
     else
         put(connection, studyId, study, {}, false);
+}
+
+void putMarks(SqlConnection& connection, qint64 studyId)
+{
+    StudySearchRecord study;
+    {
+        SqlRows answer = connection.ask("SELECT attributes FROM study_answer WHERE study_id = ?", {studyId});
+        if (answer.next())
+            study.attributes = answer.bytes(0);
+    }
+    {
+        SqlRows rows = connection.ask("SELECT attributes FROM series_search WHERE study_id = ?", {studyId});
+        while (rows.next()) {
+            study.series.emplace_back();
+            study.series.back().attributes = rows.bytes(0);
+        }
+    }
+    const QVariant marks = textValue(marksOf(study));
+    connection.change("UPDATE study_search SET marks = ? WHERE study_id = ?", {marks, studyId});
+    connection.change("UPDATE study_modality SET marks = ? WHERE study_id = ?", {marks, studyId});
 }
 
 void removeSearchRows(SqlConnection& connection, qint64 studyId)

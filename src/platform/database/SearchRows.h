@@ -27,6 +27,9 @@ void putSearchRows(SqlConnection& connection, qint64 studyId, const StudySearchR
 /// Gives a study that has no tag file yet rows of what registration knows; one that has keeps its rows.
 void putRegisteredRows(SqlConnection& connection, qint64 studyId);
 
+/// Gives the rows of a study the marks of its attributes.
+void putMarks(SqlConnection& connection, qint64 studyId);
+
 void removeSearchRows(SqlConnection& connection, qint64 studyId);
 
 }  // namespace Kxg

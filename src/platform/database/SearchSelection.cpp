@@ -11,7 +11,7 @@ namespace
 bool isOfModality(const QByteArray& column)
 {
     return column == "study_id" || column == "uid" || column == "study_date" || column == "study_time" ||
-           column == "name_words";
+           column == "name_words" || column == "marks";
 }
 
 }  // namespace

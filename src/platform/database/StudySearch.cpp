@@ -6,6 +6,7 @@
 #include "platform/database/SearchSql.h"
 #include "platform/database/SearchWords.h"
 #include "platform/database/SqlConnection.h"
+#include "platform/database/StudyMarks.h"
 #include "platform/resources/ExResource.h"
 
 #include <QHash>
@@ -25,6 +26,8 @@ constexpr int kStudyColumns = 9;
 constexpr int kSortColumns = 8;  // which the engine gives along with series
 
 constexpr int kShownAtOnce = 1000;  // studies, whose attributes are in memory twice meanwhile
+
+constexpr int kMarkedAtOnce = 500;  // studies, in one transaction
 
 /// Of changes, where not all may be seen: so many are read at a time, and looked at for one answer.
 constexpr int kChangesAtOnce = 500;
@@ -167,6 +170,22 @@ struct StudySearch::Private
         }
     }
 
+    /// Gives studies after that one their marks, as many as others can wait for. The last of them; -1: there is none.
+    qint64 markSome(qint64 after)
+    {
+        QVector<qint64> studies;
+        {
+            SqlRows rows = connection.ask("SELECT study_id FROM study_search WHERE marks = ? AND study_id > ?"
+                                          " ORDER BY study_id LIMIT ?",
+                                          {textValue(kAnyMark), after, kMarkedAtOnce});
+            while (rows.next())
+                studies.push_back(rows.number(0));
+        }
+        for (const qint64 study : qAsConst(studies))
+            putMarks(connection, study);
+        return studies.isEmpty() ? -1 : studies.last();
+    }
+
     SqlConnection connection;
     std::shared_ptr<const StudyLimits> limits;
 };
@@ -303,7 +322,7 @@ Kdd::Result StudySearch::unknownStudies(const QByteArray& after, int limit, QVec
 Kdd::Result StudySearch::prepare()
 {
     const SqlConnection::Unhurried unhurried(d->connection);
-    return d->transact(Access::Write, [&] {
+    Kdd::Result result = d->transact(Access::Write, [&] {
         obtainWordsIndex(d->connection);
         QVector<qint64> studies;
         {
@@ -316,6 +335,10 @@ Kdd::Result StudySearch::prepare()
         for (const qint64 study : qAsConst(studies))
             putRegisteredRows(d->connection, study);
     });
+    qint64 marked = 0;
+    while (result.good() && marked >= 0)
+        result = d->transact(Access::Write, [&] { marked = d->markSome(marked); });
+    return result;
 }
 
 Kdd::Result StudySearch::explainStudies(const SearchQuery& query, QByteArray& plan)

@@ -154,6 +154,8 @@ TEST_P(MigrationTest, ADatabaseOfTheFifthSchemaGetsTheIndexesOfNames)
               "CREATE INDEX study_search_by_date ON study_search (study_date DESC, study_time DESC, uid)"),
           QByteArray("DROP INDEX study_modality_by_date"),
           QByteArray("ALTER TABLE study_modality DROP COLUMN name_words"),
+          QByteArray("ALTER TABLE study_modality DROP COLUMN marks"),
+          QByteArray("ALTER TABLE study_search DROP COLUMN marks"),
           QByteArray("CREATE INDEX study_modality_by_date ON study_modality (modality, study_date DESC)"),
           "UPDATE study_search SET name_words = '" + name + "'"})
         execute(backwards.constData());

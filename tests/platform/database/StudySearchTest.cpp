@@ -133,6 +133,34 @@ TEST_P(StudySearchTest, FindsNothingBeyondItsLimits)
     EXPECT_EQ(find({}), "0 1 2 3 4");
 }
 
+TEST_P(StudySearchTest, MarksLeaveOutNothingThatIsWithinLimits)
+{
+    StudyLimit limit{StudyLimit::Of::Series, "00080080", {}};
+    StudySearchRecord few = aStudy("A", "20240101", "P1", {"CT"});
+    StudySearchRecord many = aStudy("A", "20240101", "P2", std::vector<const char*>(50, "CT"));
+    for (std::size_t i = 0; i < many.series.size(); ++i) {
+        limit.values << "00080080{\"Value\":[\"" + QByteArray::number(static_cast<int>(i)) +
+                            "\"],\"vr\":\"LO\"}";
+        many.series[i].attributes = limit.values.last() + '\n';
+    }
+    few.series[0].attributes = limit.values.last() + '\n';
+    build("1", few);
+    build("2", many);
+    search().limitTo(std::make_shared<StudyLimits>(StudyLimits{{limit}}));
+    const auto found = [&](const char* change, const char* expected) {
+        for (const char* table : {"study_search", "study_modality"})
+            execute((QByteArray("UPDATE ") + table + " SET marks = " + change).constData());
+        EXPECT_EQ(find({}), expected) << change;
+        EXPECT_EQ(find({oneOf(SearchColumn::ModalitiesInStudy, {"CT"})}), expected) << change;
+    };
+    found("marks", "1 2");
+    found("'*'", "1 2");  // as of an earlier release
+    ASSERT_TRUE(search().prepare().good());
+    found("marks", "1 2");
+    found("'other' WHERE marks = '*'", "1");  // the one with many has none
+    found("'other'", "");
+}
+
 TEST_P(StudySearchTest, PagesFollowEachOtherInEveryOrder)
 {
     for (int i = 0; i < 9; ++i)
