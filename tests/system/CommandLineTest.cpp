@@ -136,9 +136,8 @@ TEST_F(CommandLine, AUniqueBeginningNamesAStudy)
 
 TEST_F(CommandLine, WrongUsageIsToldFromFailure)
 {
-    for (const char* arguments :
-         {"", "frobnicate", "add", "verify", "verify --all 1.2", "--compression zip list", "list --no-such",
-          "qa job.xml --image 1", "qa job.xml --study 1.2"})
+    for (const char* arguments : {"", "frobnicate", "add", "verify", "verify --all 1.2",
+                                  "--compression zip list", "list --no-such", "qa job.xml --image 1"})
         EXPECT_EQ(kdd(arguments).exitCode, 2) << arguments;
     for (const char* command : {"list", "verify --all", "build --all", "stack", "previews --all pictures"})
         EXPECT_TRUE(kdd(command).err.contains("kdd.sqlite")) << command;

@@ -48,6 +48,7 @@ TEST_F(Correction, TellsWhatItDid)
     const QString edit = job("", kPatientName, "Roe^R");
     EXPECT_EQ(correct(edit, "--study 1.2 --image 1 2").out,
               "{\"changed\":2,\"images\":2,\"moved\":0,\"notFound\":0}\n");
+    EXPECT_EQ(correct(edit, "--study 1.2").exitCode, 2) << "no images";
     EXPECT_TRUE(kdd("metadata 1.2 --image 1").out.contains("Roe^R"));
     put("images.txt", "3\n\n 1 \n9\n");
     const Answer listed =

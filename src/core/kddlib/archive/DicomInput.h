@@ -58,6 +58,6 @@ enum class Damage { Refused, Tolerated };
 KDD_EXPORT DicomInput readDicomInput(const QByteArray& path, Damage damage);
 
 /// The same; `file` has what was read afterwards, also when that was not all.
-DicomInput readDicomInput(const QByteArray& path, Damage damage, DcmFileFormat& file);
+KDD_EXPORT DicomInput readDicomInput(const QByteArray& path, Damage damage, DcmFileFormat& file);
 
 }  // namespace Kdd

@@ -30,7 +30,7 @@ QJsonArray attributesOf(const QVector<AuditChange>& changes)
 struct Group
 {
     QJsonArray attributes;
-    QJsonArray images;
+    QStringList images;
 };
 
 class Groups
@@ -53,13 +53,16 @@ public:
         mGroups[mKnown.value(text)].images.append(QString::fromLatin1(publicKey(image.image)));
     }
 
-    QJsonArray json() const
+    /// In an order of its own: that of the tree is the order in which images arrived.
+    QJsonArray json()
     {
         QJsonArray made;
-        for (const Group& group : mGroups)
+        for (Group& group : mGroups) {
+            group.images.sort();
             made.append(QJsonObject{{QStringLiteral("count"), group.images.size()},
-                                    {QStringLiteral("images"), group.images},
+                                    {QStringLiteral("images"), QJsonArray::fromStringList(group.images)},
                                     {QStringLiteral("attributes"), group.attributes}});
+        }
         return made;
     }
 
