@@ -9,6 +9,7 @@
 #include <dcmtk/dcmtls/tlslayer.h>
 #include <netinet/in.h>
 #include <netinet/tcp.h>
+#include <openssl/ssl.h>
 #include <sys/socket.h>
 
 #include <algorithm>
@@ -143,13 +144,17 @@ public:
         if (condition.good())
             condition = layer->setPrivateKeyFile(rules.keyFile.constData(), DCF_Filetype_PEM);
         if (condition.good())
-            condition = layer->setCertificateFile(rules.certificateFile.constData(), DCF_Filetype_PEM);
-        if (condition.good())
             condition = layer->addTrustedCertificateFile(rules.caFile.constData(), DCF_Filetype_PEM);
         layer->setCertificateVerification(DCV_requireCertificate);
         if (condition.bad())
             result = failure("TLS cannot be spoken", condition);
-        return condition.good() ? std::move(layer) : nullptr;
+        // DCMTK's own way loses a key each time, and takes no chain.
+        else if (SSL_CTX_use_certificate_chain_file(layer->getNativeHandle(),
+                                                    rules.certificateFile.constData()) != 1)
+            result =
+                Result::failure(QStringLiteral("TLS cannot be spoken: this is no certificate of the key"))
+                    .within(QString::fromUtf8(rules.certificateFile));
+        return result.good() ? std::move(layer) : nullptr;
     }
 
     DcmTransportConnection* createConnection(DcmNativeSocketType socket, OFBool isSecure) override
