@@ -104,14 +104,19 @@ StudySearchRecord madeUp(People& people, int number)
 void fill(SqlConnection& connection)
 {
     People people;
-    connection.transact(SqlConnection::Access::Write, [&] {
-        for (int i = 0; i < kStudies; ++i) {
-            const qint64 id = obtainStudy(connection, "1.2.3." + QByteArray::number(i)).id;
-            TagFileStamp stamp;
-            stamp.modified = 1;
-            putSearchRows(connection, id, madeUp(people, i), stamp);
-        }
-    });
+    TagFileStamp stamp;
+    stamp.modified = 1;
+    // In one transaction PostgreSQL could never look at the tables anew, and would go on as with empty ones.
+    for (int i = 0; i < kStudies;) {
+        connection.transact(SqlConnection::Access::Write, [&] {
+            for (const int end = i + kStudies / 100; i < end; ++i) {
+                const qint64 id = obtainStudy(connection, "1.2.3." + QByteArray::number(i)).id;
+                putSearchRows(connection, id, madeUp(people, i), stamp);
+            }
+        });
+        if (i == kStudies / 100)
+            connection.execute(QStringLiteral("ANALYZE"));
+    }
 }
 
 StudySearch& archive()

@@ -15,10 +15,10 @@ import http.client
 import itertools
 import json
 import os
-import shutil
 import socket
 import statistics
 import sys
+import tempfile
 import threading
 import time
 
@@ -134,10 +134,13 @@ def disk_wait(folder):
 
 
 def disk_rate(folder, connections, batch, count):
-    """Files a second of half a MiB each that are written and waited for, by threads that have nothing else to do."""
+    """Files a second of half a MiB each that are written and waited for, by threads that have nothing else to do.
+
+    They stay until the end: a file system may pass over what was deleted a moment ago, one by one, for each file that comes
+    after.
+    """
     names = iter(range(count))
-    place = os.path.join(folder, "disk")
-    os.mkdir(place)
+    place = tempfile.mkdtemp(dir=folder)
 
     def write():
         while True:
@@ -158,7 +161,6 @@ def disk_rate(folder, connections, batch, count):
     for thread in threads:
         thread.join()
     wall = time.monotonic() - start
-    shutil.rmtree(place)
     return count / wall
 
 
