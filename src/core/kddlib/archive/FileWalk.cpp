@@ -59,10 +59,9 @@ void collect(const std::filesystem::directory_entry& place, const QByteArray& ab
              QList<QByteArray>& files, QStringList& faults)
 {
     std::error_code error;
-    const std::filesystem::file_status status = place.status(error);
-    if (std::filesystem::is_directory(status))
+    if (place.is_directory(error))
         collectBelow(place.path(), absolute, files, faults);
-    else if (!std::filesystem::is_other(status))
+    else if (place.is_regular_file(error) || !std::filesystem::is_other(place.status(error)))
         files.append(absolute);
 }
 
