@@ -1,7 +1,9 @@
-// What is read of a DICOM file can be put into a data set, and shows the same after it was stored in a tag file.
+// What is read of a DICOM file can be put into a data set, and shows the same after it was stored in a tag file. What is
+// read of it without the parser is what the parser reads.
 
 #include "fuzz/Property.h"
 #include "kddlib/Limits.h"
+#include "kddlib/items/PlainFiles.h"
 #include "kddlib/net/dicom/DicomFileReader.h"
 #include "kddlib/tagfile/TagFile.h"
 #include "kddlib/tagmodel/TagMap.h"
@@ -77,6 +79,9 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, std::size_t size)
     static const MemoryFile input;
     input.fill(data, size);
     std::unique_ptr<TagMap> map = mapOf(input);
+    const PlainRead plain = readPlain(input.path(), kDefaultValueBound);
+    require(!plain.isPlain || (map != nullptr && ownText(*plain.image.map) == ownText(*map)),
+            "the parser reads the same");
     if (map == nullptr)
         return 0;
     DcmDataset dataset;

@@ -1,5 +1,6 @@
 #include "kddlib/StudySources.h"
 
+#include "kddlib/net/dicom/LocalFiles.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
@@ -51,6 +52,26 @@ std::unique_ptr<TagMap> ImagesByPath::copy(const std::string& path) const
             copy->deleteElement(key);
     }
     return copy;
+}
+
+std::unique_ptr<TagMap> ImagesAhead::take(const QByteArray& path)
+{
+    if (mPaths.isEmpty() || mPaths.first() != path)
+        return nullptr;
+    mPaths.removeFirst();
+    PlainRead read = mFiles.next();
+    return read.isPlain ? std::move(read.image.map) : nullptr;
+}
+
+ImagesAhead StudySources::readAhead(int threads) const
+{
+    QList<QByteArray> paths;
+    for (const std::string& path : dicomFiles) {
+        const QByteArray name = QByteArray::fromStdString(path);
+        if (!adopted->undecided().contains(name) && !loaded.contains(name) && isReadLocally(path.c_str()))
+            paths.append(name);
+    }
+    return {paths, threads};
 }
 
 bool StudySources::query(const QByteArray& user, int studyId)

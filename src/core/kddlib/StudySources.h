@@ -1,5 +1,7 @@
 #pragma once
 
+#include "kddlib/Limits.h"
+#include "kddlib/items/PlainFiles.h"
 #include "kddlib/tagfile/TagFile.h"
 #include "kddlib/tagfile/qa/AdoptedCorrections.h"
 #include "kddlib/tagfile/qa/BuildCorrections.h"
@@ -44,8 +46,30 @@ public:
     /// What the image shows, without its place in that tag file; null when the file at the path is not among them.
     std::unique_ptr<TagMap> copy(const std::string& path) const;
 
+    bool contains(const QByteArray& path) const { return mImages.contains(path); }
+
 private:
     QHash<QByteArray, const TagMap*> mImages;
+};
+
+/// What files of a study say of their images, read ahead.
+class ImagesAhead
+{
+public:
+    /// `threads` as in `ThreadShare`.
+    ImagesAhead(const QList<QByteArray>& paths, int threads)
+        : mPaths(paths)
+        , mFiles(paths, threads, kDefaultValueBound)
+    {
+    }
+
+    /// The image of a file; null when that is not the next one or has to be loaded otherwise. Asked for in the order of
+    /// the paths.
+    std::unique_ptr<TagMap> take(const QByteArray& path);
+
+private:
+    QList<QByteArray> mPaths;  // that were not taken
+    PlainFiles mFiles;
 };
 
 /// What a study is built from.
@@ -61,6 +85,9 @@ struct StudySources
     /// Asks the database and reads the study's present tag file. Corrections that only that one tells of are recorded
     /// first, so that building has one source for all. False, with the reason logged, when something cannot be had.
     bool collect(const QByteArray& user, int studyId);
+
+    /// The files that a build loads, in its order, on `threads` as in `ThreadShare`.
+    ImagesAhead readAhead(int threads) const;
 
     /// Whether an image, as corrections make it, is the one that the database lists for the file. A file may have been
     /// given other content since it was registered.

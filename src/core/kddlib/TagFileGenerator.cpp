@@ -130,8 +130,7 @@ bool TagFileGenerator::createTagFile(TagFile& tagFile, int studyId, const char* 
     StudySources sources(loaded);
     if (!sources.collect(mUser, studyId))
         return false;
-    for (const std::string& path : sources.dicomFiles)
-        addFile(tagFile, path, studyInstanceUID, sources);
+    addFiles(tagFile, studyInstanceUID, sources);
     addVolumes(tagFile, sources.volumeFiles, sources);
     // After the volumes, because an image that a volume shows gets no preview of its own.
     QList<QByteArray> chosen;
@@ -205,16 +204,25 @@ void TagFileGenerator::finishTree(TagFile& tagFile) const
         tagFile.optimizeAll();
 }
 
+void TagFileGenerator::addFiles(TagFile& tagFile, const char* studyInstanceUID, StudySources& sources)
+{
+    // Its threads end here, before pictures are made.
+    ImagesAhead ahead = sources.readAhead(mReaders);
+    for (const std::string& path : sources.dicomFiles)
+        addFile(tagFile, path, studyInstanceUID, sources, ahead);
+}
+
 /// From the file, and where that cannot be read from the former tag file: an image is not lost
 /// because its file is out of reach for a while.
 void TagFileGenerator::addFile(TagFile& tagFile, const std::string& path, const char* studyInstanceUID,
-                               StudySources& sources)
+                               StudySources& sources, ImagesAhead& ahead)
 {
     const QByteArray name = QByteArray::fromStdString(path);
     // Where it cannot be decided which corrections hold, the image stays as
     // the tag file has it and its file is not read.
     const bool isUndecided = sources.adopted->undecided().contains(name);
-    std::unique_ptr<TagMap> image = isUndecided ? nullptr : readListed(path, studyInstanceUID, sources);
+    std::unique_ptr<TagMap> image =
+        isUndecided ? nullptr : readListed(path, studyInstanceUID, sources, ahead);
     if (image == nullptr) {
         image = isUndecided ? sources.formerImages.copy(path) : sources.copyFormer(path);
         if (!isUndecided)
@@ -231,12 +239,12 @@ void TagFileGenerator::addFile(TagFile& tagFile, const std::string& path, const 
 /// The image that the database lists for the file, as corrections make it; null, with the reason logged, when the file
 /// has no such image.
 std::unique_ptr<TagMap> TagFileGenerator::readListed(const std::string& path, const char* studyInstanceUID,
-                                                     StudySources& sources)
+                                                     StudySources& sources, ImagesAhead& ahead)
 {
     const QByteArray name = QByteArray::fromStdString(path);
     std::unique_ptr<TagMap> image = sources.loaded.copy(path);
     if (image == nullptr)
-        image = load(path, sources);
+        image = load(path, sources, ahead);
     if (image == nullptr || !sources.corrections.applyTo(*image, name))
         return nullptr;
     // After the corrections, for one may have moved the image here from the study that its file names.
@@ -252,9 +260,12 @@ std::unique_ptr<TagMap> TagFileGenerator::readListed(const std::string& path, co
 }
 
 /// The image as the file has it; null, with the reason logged, when it cannot be read.
-std::unique_ptr<TagMap> TagFileGenerator::load(const std::string& path, StudySources& sources)
+std::unique_ptr<TagMap> TagFileGenerator::load(const std::string& path, StudySources& sources,
+                                               ImagesAhead& ahead)
 {
     const StopwatchSum::Running running(mLoadWatch);
+    if (std::unique_ptr<TagMap> image = ahead.take(QByteArray::fromStdString(path)))
+        return image;
     DcmFileFormat file;
     const OFCondition condition = loadDicomFile(path.c_str(), file);
     if (condition.bad()) {

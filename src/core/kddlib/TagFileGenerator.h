@@ -14,6 +14,7 @@
 namespace Kdd
 {
 
+class ImagesAhead;
 class OrlanMesh;
 class TagFile;
 class TagMap;
@@ -42,6 +43,9 @@ public:
     TagFileGenerator(const char* user, bool optimize);
 
     void setOptions(const char* user, bool optimize);
+
+    /// Files read at once; 0, as at first: as many as there are cores to spare. What is built does not depend on it.
+    void setReaders(int readers) { mReaders = readers; }
 
     /// Builds the study of that number into `tagFile`, in place of what it holds, and writes its cache file. With
     /// `studyInstanceUID` not null, files before the first image that belong to another study are warned about and
@@ -88,11 +92,12 @@ protected:
     VolumeInfo* createVolumeInfo(const char* path, QByteArray& seriesInstanceUID);
 
 private:
+    void addFiles(TagFile& tagFile, const char* studyInstanceUID, StudySources& sources);
     void addFile(TagFile& tagFile, const std::string& path, const char* studyInstanceUID,
-                 StudySources& sources);
+                 StudySources& sources, ImagesAhead& ahead);
     std::unique_ptr<TagMap> readListed(const std::string& path, const char* studyInstanceUID,
-                                       StudySources& sources);
-    std::unique_ptr<TagMap> load(const std::string& path, StudySources& sources);
+                                       StudySources& sources, ImagesAhead& ahead);
+    std::unique_ptr<TagMap> load(const std::string& path, StudySources& sources, ImagesAhead& ahead);
     void addVolumes(TagFile& tagFile, const std::vector<std::string>& volumeFiles, StudySources& sources);
     static bool write(TagFile& tagFile, StudySources& sources);
     static bool addImage(TagFile& tagFile, std::unique_ptr<TagMap> image, const std::string& path,
@@ -103,6 +108,7 @@ private:
 
     QByteArray mUser;
     bool mOptimize = true;
+    int mReaders = 0;
     int mNumKept = 0;
     int mNumMissing = 0;
     StopwatchSum mLoadWatch;

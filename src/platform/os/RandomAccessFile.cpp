@@ -50,6 +50,11 @@ bool RandomAccessFile::isUnchanged() const
     return ::fstat(mDescriptor, &status) == 0 && identityOf(status) == mIdentity;
 }
 
+void RandomAccessFile::askFor(qint64 offset, qint64 count) const
+{
+    ::posix_fadvise(mDescriptor, offset, count, POSIX_FADV_WILLNEED);
+}
+
 qint64 RandomAccessFile::readAt(qint64 offset, void* bytes, qint64 count) const
 {
     qint64 done = 0;

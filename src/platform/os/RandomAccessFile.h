@@ -44,6 +44,9 @@ public:
     /// Whether it still is as it was.
     bool isUnchanged() const;
 
+    /// Asks for bytes that will be read soon, without waiting for them; of no use for what is in memory already.
+    void askFor(qint64 offset, qint64 count) const;
+
     /// Reads up to `count` bytes at `offset`, fewer only at the end of the file; -1 on a read error.
     qint64 readAt(qint64 offset, void* bytes, qint64 count) const;
 

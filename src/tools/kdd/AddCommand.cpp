@@ -84,6 +84,7 @@ Outcome runAdd(const GlobalOptions& options, const ScanRequest& request)
     scan.setOwnPlaces(ownPlaces(options));
     scan.setNamesSkipped(options.verbose);
     scan.setDamage(request.tolerant ? Damage::Tolerated : Damage::Refused);
+    scan.setReaders(request.jobs);
     // Gathers what the scan hands on, so that a study is completed once for all its files.
     StudyIntake intake(*database, progress);
     Result taken = scan.run(request.paths, [&](DicomInput input) { return intake.take(std::move(input)); });

@@ -29,6 +29,7 @@ Outcome runIndex(const GlobalOptions& options, const ScanRequest& request)
     scan.setOwnPlaces(ownPlaces(options));
     scan.setNamesSkipped(options.verbose);
     scan.setDamage(request.tolerant ? Damage::Tolerated : Damage::Refused);
+    scan.setReaders(request.jobs);
     Registration registration(*database);
     Result registered =
         scan.run(request.paths, [&](const DicomInput& input) { return registration.add(input); });

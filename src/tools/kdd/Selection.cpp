@@ -8,6 +8,7 @@ void ScanRequest::addTo(ArgumentList& arguments)
     arguments.texts({"PATH", kPath, "Files and folders", true}, paths);
     arguments.flag("--tolerant", tolerant,
                    "Of damaged DICOM files take what is sound, with a warning that says what is left out");
+    arguments.number("--jobs", 1, 256, jobs, "Files read at once; otherwise as many as there are cores");
 }
 
 void StudySelection::addTo(ArgumentList& arguments)

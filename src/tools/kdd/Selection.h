@@ -11,6 +11,7 @@ struct ScanRequest
 {
     QList<QByteArray> paths;
     bool tolerant = false;  ///< of damaged DICOM files take what is sound
+    int jobs = 0;           ///< files read at once; 0: as many as there are cores
 
     void addTo(ArgumentList& arguments);
 };

@@ -1,6 +1,7 @@
 #include "kddlib/archive/DicomInput.h"
 
 #include "kddlib/Limits.h"
+#include "kddlib/archive/PlainInput.h"
 #include "kddlib/net/dicom/DamagedFile.h"
 #include "kddlib/net/dicom/DicomFileReader.h"
 #include "kddlib/tagmodel/TagMap.h"
@@ -98,26 +99,21 @@ qint64 pixelBytes(DcmItem& dataset)
     return bytes;
 }
 
-/// Makes an image of the dataset, unless its UIDs cannot serve as names.
-DicomInput& take(DicomInput& input, DcmFileFormat& file)
+/// Makes an image of what its map holds, unless its UIDs cannot serve as names.
+DicomInput& take(DicomInput& input, std::unique_ptr<TagMap> map, qint64 pixels)
 {
-    DcmDataset& dataset = *file.getDataset();
-    input.headerBytes = qMax<qint64>(0, input.fileBytes - pixelBytes(dataset));
-    input.map.reset(TagMap::createTagMap(&dataset, kDefaultValueBound));
-    if (const char* name = strangeUid(*input.map)) {
-        input.map.reset();
+    input.headerBytes = qMax<qint64>(0, input.fileBytes - pixels);
+    if (const char* name = strangeUid(*map))
         return refuse(input, DicomInput::Kind::Unusable,
                       QStringLiteral("%1 has bytes that no UID has").arg(QLatin1String(name)));
-    }
-    input.studyUID = input.map->uid(TagMap::StudyLevel);
-    input.seriesUID = input.map->uid(TagMap::SeriesLevel);
+    input.studyUID = map->uid(TagMap::StudyLevel);
+    input.seriesUID = map->uid(TagMap::SeriesLevel);
     // Together in a study without a name, or a series, the images of two patients would meet.
-    if (input.studyUID.isEmpty() || input.seriesUID.isEmpty()) {
-        input.map.reset();
+    if (input.studyUID.isEmpty() || input.seriesUID.isEmpty())
         return refuse(input, DicomInput::Kind::Unusable,
                       input.studyUID.isEmpty() ? QStringLiteral("It has no Study Instance UID")
                                                : QStringLiteral("It has no Series Instance UID"));
-    }
+    input.map = std::move(map);
     input.kind = DicomInput::Kind::Image;
     return input;
 }
@@ -147,6 +143,9 @@ DicomInput::~DicomInput() = default;
 
 DicomInput readDicomInput(const QByteArray& path, Damage damage)
 {
+    DicomInput plain;
+    if (takePlain(path, readPlain(path, kDefaultValueBound), plain))
+        return plain;
     DcmFileFormat format;
     return readDicomInput(path, damage, format);
 }
@@ -183,7 +182,20 @@ DicomInput readDicomInput(const QByteArray& path, Damage damage, DcmFileFormat& 
                                                 : QStringLiteral("No DICOM object")));
     if (isMediaDirectory(format))
         return std::move(refuse(input, DicomInput::Kind::Other, QStringLiteral("Media directory")));
-    return std::move(take(input, format));
+    DcmDataset& dataset = *format.getDataset();
+    std::unique_ptr<TagMap> map(TagMap::createTagMap(&dataset, kDefaultValueBound));
+    return std::move(take(input, std::move(map), pixelBytes(dataset)));
+}
+
+bool takePlain(const QByteArray& path, PlainRead read, DicomInput& input)
+{
+    if (!read.isPlain || path.size() > Kxg::kMaxPath)
+        return false;
+    input.path = path;
+    input.stamp = {read.identity.size, read.identity.modified};
+    input.fileBytes = read.identity.size;
+    take(input, std::move(read.image.map), read.image.pixelBytes);
+    return true;
 }
 
 }  // namespace Kdd

@@ -1,35 +1,20 @@
 #include "kddlib/archive/FileScan.h"
 
+#include "kddlib/Limits.h"
 #include "kddlib/archive/FileWalk.h"
+#include "kddlib/archive/PlainInput.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
 #include "platform/os/FileStatus.h"
 
+#include <dcmtk/config/osconfig.h>
+
+#include <dcmtk/dcmdata/dcfilefo.h>
+
 #include <algorithm>
-#include <deque>
-#include <future>
-#include <thread>
-#include <vector>
 
 namespace Kdd
 {
-
-namespace
-{
-
-/// Files read ahead of the one being handed on, so that reading uses every core.
-constexpr int kFilesPerTask = 16;
-
-std::vector<DicomInput> readSome(const QList<QByteArray>& paths, Damage damage)
-{
-    std::vector<DicomInput> inputs;
-    inputs.reserve(static_cast<std::size_t>(paths.size()));
-    for (const QByteArray& path : paths)
-        inputs.push_back(readDicomInput(path, damage));
-    return inputs;
-}
-
-}  // namespace
 
 Result FileScan::run(const QList<QByteArray>& paths, const std::function<Result(DicomInput)>& take)
 {
@@ -38,31 +23,23 @@ Result FileScan::run(const QList<QByteArray>& paths, const std::function<Result(
     return found.good() ? readAll(files, take) : found;
 }
 
-/// Reads the files on as many threads as there are cores and hands them on in their order.
+/// Files of the usual form are read ahead. Any other is read here, in its turn: what is said of it in the log then has
+/// its place, and of several files of one image the last counts.
 Result FileScan::readAll(const QList<QByteArray>& files, const std::function<Result(DicomInput)>& take)
 {
-    const unsigned ahead = qMax(1U, std::thread::hardware_concurrency());
-    // Whatever ends this early waits for the reading that is under way: the future of a task joins its thread.
-    std::deque<std::future<std::vector<DicomInput>>> running;
-    int next = 0;
-    qint64 done = 0;
-    while (next < files.size() || !running.empty()) {
-        // Bounded, because what was read stands in memory until it is its turn.
-        while (next < files.size() && running.size() <= ahead) {
-            running.push_back(
-                std::async(std::launch::async, readSome, files.mid(next, kFilesPerTask), mDamage));
-            next += kFilesPerTask;
+    PlainFiles ahead(files, mReaders, kDefaultValueBound);
+    for (int i = 0; i < files.size(); ++i) {
+        if (mObserver.isCancelled())
+            return {};
+        DicomInput input;
+        if (!takePlain(files.at(i), ahead.next(), input)) {
+            DcmFileFormat format;
+            input = readDicomInput(files.at(i), mDamage, format);
         }
-        // Handed on in their order, whichever is read first: of several files of one image the last counts.
-        for (DicomInput& input : running.front().get()) {
-            if (mObserver.isCancelled())
-                return {};
-            Result taken = handOn(std::move(input), take);
-            if (taken.bad())
-                return taken;
-            mObserver.progress(++done, files.size());
-        }
-        running.pop_front();
+        Result taken = handOn(std::move(input), take);
+        if (taken.bad())
+            return taken;
+        mObserver.progress(i + 1, files.size());
     }
     return {};
 }

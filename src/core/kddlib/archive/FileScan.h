@@ -34,6 +34,9 @@ public:
     /// Files that are no images are named in the log.
     void setNamesSkipped(bool names) { mNamesSkipped = names; }
 
+    /// Files read at once; 0, as at first: as many as there are cores to spare. What comes of a scan does not depend on it.
+    void setReaders(int readers) { mReaders = readers; }
+
     /// Reads the files at and below the paths, several at a time, and hands on what each one is in their order until
     /// `take` fails or the observer cancels. Files that cannot be read are logged and refused instead. Failure: that of
     /// the database or of `take`.
@@ -54,6 +57,7 @@ private:
     QList<QByteArray> mOwnPlaces;
     bool mNamesSkipped = false;
     Damage mDamage = Damage::Refused;
+    int mReaders = 0;
     int mUnchanged = 0;
     int mSkipped = 0;
     std::vector<RefusedFile> mRefused;

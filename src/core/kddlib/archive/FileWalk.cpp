@@ -27,35 +27,42 @@ QString fault(const std::filesystem::path& path, const std::error_code& error)
                                         QString::fromStdString(error.message()));
 }
 
-void collect(const std::filesystem::path& place, QList<QByteArray>& files, QStringList& faults);
+void collect(const std::filesystem::directory_entry& place, const QByteArray& absolute,
+             QList<QByteArray>& files, QStringList& faults);
 
-void collectBelow(const std::filesystem::path& folder, QList<QByteArray>& files, QStringList& faults)
+void collectBelow(const std::filesystem::path& folder, const QByteArray& absolute, QList<QByteArray>& files,
+                  QStringList& faults)
 {
     std::error_code error;
     // Listed before anything below is entered, so that no more than one folder is open at a time, and
     // sorted, because file systems list in any order.
-    std::vector<std::filesystem::path> entries;
+    std::vector<std::filesystem::directory_entry> entries;
     for (std::filesystem::directory_iterator it(folder, error), end; !error && it != end; it.increment(error))
-        entries.push_back(it->path());
+        entries.push_back(*it);
     if (error)
         faults.append(fault(folder, error));
-    std::sort(entries.begin(), entries.end());
-    for (const std::filesystem::path& entry : entries) {
+    std::sort(entries.begin(), entries.end(),
+              [](const auto& a, const auto& b) { return a.path().native() < b.path().native(); });
+    const QByteArray above = absolute.endsWith('/') ? absolute : absolute + '/';
+    const std::size_t head = folder.native().size() + (folder.native().back() == '/' ? 0 : 1);
+    for (const std::filesystem::directory_entry& entry : entries) {
         // A linked folder may lead back up; linked files are welcome.
-        if (!std::filesystem::is_symlink(entry, error) || !std::filesystem::is_directory(entry, error))
-            collect(entry, files, faults);
+        if (!entry.is_symlink(error) || !entry.is_directory(error))
+            collect(entry, above + QByteArray::fromStdString(entry.path().native().substr(head)), files,
+                    faults);
     }
 }
 
-/// Pipes, sockets and devices are no files; a link that leads nowhere is taken for one, so that its reading tells.
-void collect(const std::filesystem::path& place, QList<QByteArray>& files, QStringList& faults)
+/// Pipes, sockets and devices are no files; a link that leads nowhere is taken for one, so that its reading tells. The
+/// listing of a folder mostly tells what an entry is, and nobody else is asked then.
+void collect(const std::filesystem::directory_entry& place, const QByteArray& absolute,
+             QList<QByteArray>& files, QStringList& faults)
 {
     std::error_code error;
-    const std::filesystem::file_status status = std::filesystem::status(place, error);
-    if (std::filesystem::is_directory(status))
-        collectBelow(place, files, faults);
-    else if (!std::filesystem::is_other(status))
-        files.append(absolutePath(bytes(place)));
+    if (place.is_directory(error))
+        collectBelow(place.path(), absolute, files, faults);
+    else if (place.is_regular_file(error) || !std::filesystem::is_other(place.status(error)))
+        files.append(absolute);
 }
 
 }  // namespace
@@ -77,7 +84,7 @@ QList<QByteArray> filesBelow(const QList<QByteArray>& paths, QStringList& faults
         std::error_code error;
         // Of the link itself: one that leads nowhere is there, and reading it tells what is wrong.
         if (std::filesystem::exists(std::filesystem::symlink_status(place, error)))
-            collect(place, files, faults);
+            collect(std::filesystem::directory_entry(place, error), absolutePath(path), files, faults);
         else
             faults.append(
                 fault(place, error ? error : std::make_error_code(std::errc::no_such_file_or_directory)));

@@ -1,11 +1,11 @@
 #include "kddlib/Limits.h"
+#include "kddlib/tagmodel/KeptValues.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/tagmodel/TagSequence.h"
 #include "platform/base/LogFile.h"
 
 #include <dcmtk/dcmdata/dcdatset.h>
-#include <dcmtk/dcmdata/dcdeftag.h>
 #include <dcmtk/dcmdata/dcelem.h>
 #include <dcmtk/dcmdata/dcpixel.h>
 #include <dcmtk/dcmdata/dcsequen.h>
@@ -18,43 +18,6 @@ namespace Kdd
 
 namespace
 {
-
-/// Curve Data (50xx,3000) and Overlay Data (60xx,3000) have sixteen
-/// groups each, from `first` on in steps of two.
-bool isRepeatingGroup(const DcmTagKey& key, Uint16 first)
-{
-    return key.getGroup() >= first && key.getGroup() <= first + 0x1e && key.getElement() == 0x3000;
-}
-
-/// What a file brings under our own keys is not ours: it would pass for the image's path, volume or preview.
-bool isOwnAttribute(const DcmTagKey& key)
-{
-    return key.getGroup() == 0x0006 && (key.getElement() & 0xff00) == 0x7100;
-}
-
-/// Attributes that viewers need whole whatever their length.
-bool hasLargeBound(const DcmTagKey& key)
-{
-    const int low = key.getElement() & 0xff;
-    switch (key.getGroup()) {
-    case 0x0018:
-        return key == DCM_FrameTimeVector;
-    case 0x0029:
-        return low == 0x00;
-    case 0x0070:
-        return key == DCM_GraphicData;
-    case 0x0071:
-        // 21 is our audit log, which the next correction continues.
-        return low == 0x21 || low == 0x62 || low == 0x64;
-    default:
-        return isRepeatingGroup(key, 0x5000) || isRepeatingGroup(key, 0x6000);
-    }
-}
-
-bool isLookupTableSequence(const DcmTagKey& key)
-{
-    return key == DCM_VOILUTSequence || key == DCM_PresentationLUTSequence;
-}
 
 /// DCMTK gives encapsulated pixel data the length 0, and asking it for the value would read 4 GiB.
 bool isEncapsulated(DcmElement& element)
@@ -150,7 +113,6 @@ void TagMap::addSequence(DcmSequenceOfItems& sequence, unsigned int maxLength, i
         // the values that are too long are left out.
         markAsOmitted(key);
     } else {
-        // The table is a value of an item, so the larger bound has to go down into the items.
         setSequence(&sequence, isLookupTableSequence(key) ? kLargeValueBound : maxLength, depth);
     }
 }

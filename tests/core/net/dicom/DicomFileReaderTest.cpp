@@ -6,6 +6,7 @@
 #include "kddlib/tagmodel/TagSequence.h"
 #include "support/FileContent.h"
 #include "support/LogCapture.h"
+#include "support/RealFiles.h"
 
 #include <QtEndian>
 
@@ -161,6 +162,23 @@ TEST_F(DicomFileReader, LeavesTheSameBoundToDatasetsInMemory)
     const LogCapture log;
     EXPECT_EQ(depthOf(*file.getDataset(), DCM_ReferencedImageSequence), kMaxItemDepth);
     EXPECT_EQ(log.count("Sequence (0008,1140) lies deeper than 256 items and is left out"), 1);
+}
+
+/// One damaged file among many must not end the whole work.
+TEST(DicomFile, RefusesADirectoryWhoseRecordTypeHasAWrongLength)
+{
+    if (realFilesFolder().isEmpty())
+        GTEST_SKIP() << "KDD_TEST_DATA names no folder of DICOM files";
+    QByteArray bytes = fileContent(realFiles("odd/dicomdir").first());
+    const int at = bytes.indexOf(QByteArray("\x04\x00\x30\x14"
+                                            "CS\x06\x00STUDY ",
+                                            14));
+    ASSERT_GT(at, 0);
+    bytes[at + 6] = static_cast<char>(0xff);
+    QTemporaryDir folder;
+    putFile(folder.filePath(QStringLiteral("file")), bytes);
+    DcmFileFormat file;
+    EXPECT_TRUE(readDicomFile(folder.filePath(QStringLiteral("file")).toUtf8().constData(), file).bad());
 }
 
 }  // namespace

@@ -1,5 +1,7 @@
 #include "kddlib/net/dicom/DicomParse.h"
 
+#include <stdexcept>
+
 namespace Kdd
 {
 
@@ -13,9 +15,14 @@ OFCondition parseStream(DcmInputStream& stream, DcmFileFormat& file, const Parse
     file.clear();
     file.setReadMode(options.mode);
     file.transferInit();
-    condition = options.reader
-                    ? options.reader(stream, options.maxReadLength)
-                    : file.read(stream, options.syntax, options.groupLength, options.maxReadLength);
+    try {
+        condition = options.reader
+                        ? options.reader(stream, options.maxReadLength)
+                        : file.read(stream, options.syntax, options.groupLength, options.maxReadLength);
+    } catch (const std::out_of_range&) {
+        // Where a length is damaged, the parser may correct a text before its beginning.
+        condition = EC_CorruptedData;
+    }
     file.transferEnd();
     return condition;
 }

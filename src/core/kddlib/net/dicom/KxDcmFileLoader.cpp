@@ -7,6 +7,7 @@
 #include "kddlib/net/dicom/DicomParse.h"
 #include "kddlib/net/dicom/ForwardedStream.h"
 #include "kddlib/net/dicom/LocalFileStream.h"
+#include "kddlib/net/dicom/LocalFiles.h"
 #include "kddlib/net/dicom/StoragePath.h"
 #include "kddlib/net/http/CurlError.h"
 #include "platform/base/LogFile.h"
@@ -231,6 +232,11 @@ bool KxDcmFileLoader::convertPathToURL(std::string& url, const char* port)
 std::string KxDcmFileLoader::convertPathToExternalURL(const char* path)
 {
     return externalStorageUrl(path ? path : "");
+}
+
+bool isReadLocally(const char* name)
+{
+    return !KxCurlClient::isUrl(name) && (ownMode() != Mode::StorageServer || storageUrl(name, "").empty());
 }
 
 OFCondition loadDicomFile(const char* name, DcmFileFormat& file)

@@ -1,0 +1,199 @@
+#include "kddlib/archive/PlainInput.h"
+
+#include "kddlib/Limits.h"
+#include "kddlib/archive/DicomInput.h"
+#include "kddlib/tagmodel/TagMap.h"
+#include "support/DatasetBuilder.h"
+#include "support/FileContent.h"
+#include "support/LogCapture.h"
+#include "support/RealFiles.h"
+#include "support/TreeText.h"
+
+#include <dcmtk/dcmdata/dcpxitem.h>
+
+using namespace Kdd;
+
+namespace
+{
+
+std::string textOf(const DicomInput& input)
+{
+    std::string text = std::to_string(int(input.kind)) + ' ' + input.reason.toStdString() + '\n' +
+                       input.path.toStdString() + '\n' + input.studyUID.toStdString() + '\n' +
+                       input.seriesUID.toStdString() + '\n' + std::to_string(input.stamp.size) + ' ' +
+                       std::to_string(input.stamp.modified) + ' ' + std::to_string(input.fileBytes) + ' ' +
+                       std::to_string(input.headerBytes) + '\n';
+    return input.map != nullptr ? text + ownText(*input.map) : text;
+}
+
+/// Whether the file is read without the parser; what then is said of it must be what the parser says.
+bool isPlain(const QString& path)
+{
+    const QByteArray name = path.toLocal8Bit();
+    DicomInput plain;
+    if (!takePlain(name, readPlain(name, kDefaultValueBound), plain))
+        return false;
+    DcmFileFormat format;
+    const LogCapture log;
+    EXPECT_EQ(textOf(plain), textOf(readDicomInput(name, Damage::Refused, format))) << name.constData();
+    EXPECT_TRUE(log.lines().empty()) << "of what is plain nothing is to be told";
+    return true;
+}
+
+/// An element whose value is as long as it says, whatever it holds.
+DcmElement* privateValue(Uint16 element, const QByteArray& bytes)
+{
+    auto* made = new DcmOtherByteOtherWord(DcmTag(0x0029, element, EVR_UN));
+    made->putUint8Array(reinterpret_cast<const Uint8*>(bytes.constData()),
+                        static_cast<unsigned long>(bytes.size()));
+    return made;
+}
+
+/// Something of every kind that has a rule of its own.
+DatasetBuilder anImageOfAllKinds()
+{
+    const DatasetBuilder inner = anItem().with(DCM_CodeValue, "113").with(DCM_CodeMeaning, "Odd");
+    const DatasetBuilder item = anItem()
+                                    .with(DCM_ReferencedSOPInstanceUID, "1.2.3")
+                                    .withItem(DCM_PurposeOfReferenceCodeSequence, inner);
+    DatasetBuilder table = anItem().words({1, 2, 3, 4}, DCM_LUTData);
+    return anImage("1.2.3.4")
+        .with(DCM_PatientName, "Doe^Jane")
+        .with(DCM_PatientComments, "   ")
+        .with(DCM_AccessionNumber, "")
+        .with(DCM_PixelRepresentation, "1")
+        .with(DcmTag(DCM_SmallestImagePixelValue, EVR_SS), "-5")
+        .with(DCM_FrameIncrementPointer, "(0018,1063)")
+        .with(DCM_RescaleSlope, "0.5")
+        .withLong(DCM_ImageComments, 3000)
+        .with(DcmTag(0x0029, 0x0010, EVR_LO), "VENDOR A")
+        .with(privateValue(0x1001, "abcd"))
+        .with(privateValue(0x1002, QByteArray(5000, 'x')))
+        .withItem(DcmTag(0x0029, 0x1010, EVR_SQ), anItem().withLong(DCM_TextValue, 900))
+        .withItem(DcmTag(0x0029, 0x1011, EVR_SQ), anItem().withLong(DCM_TextValue, 988))
+        .withItem(DcmTag(0x0029, 0x1012, EVR_SQ), anItem().withLong(DCM_TextValue, 990))
+        .withItem(DcmTag(0x0029, 0x1013, EVR_SQ), anItem().withLong(DCM_TextValue, 992))
+        .withItem(DCM_ReferencedImageSequence, item)
+        .withItem(DCM_ReferencedImageSequence, anItem())
+        .withItem(DCM_VOILUTSequence, table)
+        .words(std::vector<Uint16>(600, 7), DcmTagKey(0x6000, 0x3000))
+        .words(std::vector<Uint16>(5000, 1000));
+}
+
+struct Encoding
+{
+    const char* name;
+    E_TransferSyntax xfer;
+    E_EncodingType lengths;
+    bool isPlain;
+    bool isPlainWithSequences;  // that the dictionary does not know
+};
+
+const Encoding kEncodings[] = {
+    {"Explicit", EXS_LittleEndianExplicit, EET_ExplicitLength, true, true},
+    {"Delimited", EXS_LittleEndianExplicit, EET_UndefinedLength, true, true},
+    {"Implicit", EXS_LittleEndianImplicit, EET_ExplicitLength, true, true},
+    {"ImplicitDelimited", EXS_LittleEndianImplicit, EET_UndefinedLength, true, false},
+    {"BigEndian", EXS_BigEndianExplicit, EET_ExplicitLength, false, false},
+    {"Deflated", EXS_DeflatedLittleEndianExplicit, EET_ExplicitLength, false, false}};
+
+class PlainInputFile : public testing::Test
+{
+protected:
+    QString save(const DatasetBuilder& image, E_TransferSyntax xfer, E_EncodingType lengths)
+    {
+        DcmFileFormat file(&image.dataset());
+        EXPECT_TRUE(file.saveFile(path().toUtf8().constData(), xfer, lengths).good());
+        return path();
+    }
+
+    QString path() const { return mFolder.filePath(QStringLiteral("file")); }
+
+    QTemporaryDir mFolder;
+};
+
+class PlainInput : public PlainInputFile, public testing::WithParamInterface<Encoding>
+{
+};
+
+TEST_P(PlainInput, SaysWhatTheParserSays)
+{
+    const Encoding& encoding = GetParam();
+    EXPECT_EQ(isPlain(save(anImageOfAllKinds(), encoding.xfer, encoding.lengths)),
+              encoding.isPlainWithSequences);
+    EXPECT_EQ(isPlain(save(anImage("1").bytes({1, 2}, DCM_PixelData), encoding.xfer, encoding.lengths)),
+              encoding.isPlain);
+}
+
+/// Whatever the damage is: what is taken all the same is what the parser takes.
+TEST_P(PlainInput, IsLeftToTheParserWhenItIsDamaged)
+{
+    const Encoding& encoding = GetParam();
+    const DatasetBuilder image = anImageOfAllKinds()
+                                     .without(DCM_ImageComments)
+                                     .without(DCM_PixelData)
+                                     .without(DcmTagKey(0x6000, 0x3000))
+                                     .without(DcmTagKey(0x0029, 0x1002))
+                                     .without(DcmTagKey(0x0029, 0x1010))
+                                     .without(DcmTagKey(0x0029, 0x1011))
+                                     .without(DcmTagKey(0x0029, 0x1012))
+                                     .without(DcmTagKey(0x0029, 0x1013));
+    const QByteArray whole = fileContent(save(image, encoding.xfer, encoding.lengths));
+    int taken = 0;
+    for (int i = 132; i < whole.size() && encoding.isPlain && !HasFailure(); ++i) {
+        QByteArray damaged = whole;
+        damaged[i] = static_cast<char>(damaged.at(i) ^ (i % 3 == 0 ? 1 : i % 3 == 1 ? 0x20 : 0x80));
+        putFile(path(), damaged);
+        taken += isPlain(path()) ? 1 : 0;
+        putFile(path(), whole.left(i));
+        taken += isPlain(path()) ? 1 : 0;
+    }
+    EXPECT_TRUE(taken > 50 || !encoding.isPlain) << "values may be anything: " << taken;
+}
+
+INSTANTIATE_TEST_SUITE_P(Encodings, PlainInput, testing::ValuesIn(kEncodings),
+                         [](const auto& row) { return std::string(row.param.name); });
+
+TEST_F(PlainInputFile, CountsFragmentsAndPassesOverThem)
+{
+    DatasetBuilder image = anImage("1.2");
+    auto* pixels = new DcmPixelData(DcmTag(DCM_PixelData, EVR_OB));
+    auto* fragments = new DcmPixelSequence(DcmTag(DCM_PixelData, EVR_OB));
+    for (const int size : {0, 70000, 4, 3000}) {
+        auto* fragment = new DcmPixelItem(DcmTag(DCM_Item, EVR_OB));
+        fragment->putUint8Array(std::vector<Uint8>(static_cast<std::size_t>(size), 1).data(),
+                                static_cast<unsigned long>(size));
+        fragments->insert(fragment);
+    }
+    pixels->putOriginalRepresentation(EXS_JPEGProcess14SV1, nullptr, fragments);
+    image.with(pixels).bytes({1, 2, 3, 4}, DCM_DataSetTrailingPadding);
+    const QByteArray whole = fileContent(save(image, EXS_JPEGProcess14SV1, EET_UndefinedLength));
+    EXPECT_TRUE(isPlain(path()));
+    for (const int cut : {1, 15, 20, 3000, 4000, 73000}) {
+        putFile(path(), whole.chopped(cut));
+        EXPECT_FALSE(isPlain(path())) << cut;
+    }
+}
+
+/// What a program told the parser counts.
+TEST_F(PlainInputFile, IsNotReadWhenTheParserIsToReadOtherwise)
+{
+    save(anImage("1.2"), EXS_LittleEndianExplicit, EET_ExplicitLength);
+    ASSERT_TRUE(isPlain(path()));
+    dcmEnableAutomaticInputDataCorrection.set(OFFalse);
+    EXPECT_FALSE(isPlain(path()));
+    dcmEnableAutomaticInputDataCorrection.set(OFTrue);
+}
+
+TEST(PlainInputOfRealFiles, SaysWhatTheParserSays)
+{
+    if (realFilesFolder().isEmpty())
+        GTEST_SKIP() << "KDD_TEST_DATA names no folder of DICOM files";
+    int plain = 0;
+    const QStringList files = realFiles("");
+    for (const QString& file : files)
+        plain += isPlain(file) ? 1 : 0;
+    EXPECT_GT(2 * plain, files.size()) << "of which many are unusual on purpose";
+}
+
+}  // namespace
