@@ -96,6 +96,7 @@ set(KDD_PUBLIC_HEADERS
   platform/filecache/ExFileCache.h
   platform/os/ExclusiveFile.h
   platform/os/FileStatus.h
+  platform/os/ModuleFile.h
   platform/os/PathName.h
   platform/os/SystemResult.h
   platform/resources/ExResource.h

@@ -61,8 +61,13 @@ headers=$root/usr/include/kddlib
 [ -z "$(find "$headers" -mindepth 1 -type d)" ] || fail "Installed headers lie in folders"
 ! grep -rn '#include "' "$headers" || fail "An installed header names a folder of the source"
 ! grep -rIl "$build" "$root/usr" || fail "These know where they were built"
-for file in "$root"/usr/bin/kdd "$root"/usr/lib/*/libkdd.so.0 "$root"/usr/lib/*/kddlib/kdd-video.so; do
+for file in "$root"/usr/bin/kdd "$root"/usr/lib/*/libkdd.so.0 "$root"/usr/lib/*/kddlib/*.so; do
     ! readelf -d "$file" | grep -E 'R(UN)?PATH' | grep -v '\[\$ORIGIN/' || fail "$file looks for libraries elsewhere"
 done
 
 "$root/usr/bin/kdd" --version
+# What reading a tag file does not need is not there at the start.
+loaded=$(ldd "$root/usr/bin/kdd")
+for name in Qt5Gui Qt5Sql crypto curl dcmjpeg dcmnet hdf5 isal openjp2 pq; do
+    ! grep -E "lib$name[._]" <<<"$loaded" || fail "The tool starts with $name"
+done

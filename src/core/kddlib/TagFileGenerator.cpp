@@ -16,6 +16,7 @@
 #include "kddlib/volumes/Volume.h"
 #include "kddlib/volumes/VolumeInfo.h"
 #include "platform/base/LogFile.h"
+#include "platform/late/LateLibrary.h"
 #include "platform/os/PathName.h"
 #include "platform/volumefile/OrlanMesh.h"
 
@@ -383,6 +384,9 @@ VolumeInfo* TagFileGenerator::createVolumeInfo(const char* path, QByteArray& ser
 void TagFileGenerator::addPreview(OrlanMesh& mesh, const char* path, VolumeInfo& info)
 {
     const StopwatchSum::Running running(mPreviewWatch);
+    if (const Result loaded = loadLate(LateLibrary::Pictures); loaded.bad())
+        return LogFile::warnf("Could not create preview image of %s: %s", path,
+                              qUtf8Printable(loaded.text()));
     const Vec2i size = TagFile::previewSize();
     const QImage image = PreviewGenerator::createPreviewImage(
         &mesh, path, static_cast<unsigned long>(size.x), static_cast<unsigned long>(size.y), info.dims.z / 2);

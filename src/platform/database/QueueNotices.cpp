@@ -1,6 +1,7 @@
 #include "platform/database/QueueNotices.h"
 
 #include "platform/database/SqlDialect.h"
+#include "platform/late/LateLibrary.h"
 
 #include <libpq-fe.h>
 
@@ -81,7 +82,9 @@ QueueNotices::~QueueNotices() = default;
 std::unique_ptr<QueueNotices> QueueNotices::open(const DatabaseAddress& address, const Kdd::WakeSignal& stop,
                                                  Kdd::Result& result)
 {
-    result = {};
+    result = Kdd::loadLate(Kdd::LateLibrary::Postgresql);
+    if (result.bad())
+        return nullptr;
     Connection connection = connectTo(address);
     if (!listens(connection.get())) {
         result = Kdd::Result::failure(QString::fromUtf8(PQerrorMessage(connection.get())).simplified())

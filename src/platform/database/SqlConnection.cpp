@@ -2,6 +2,7 @@
 
 #include "platform/database/SqlDialect.h"
 #include "platform/database/SqliteFile.h"
+#include "platform/late/LateLibrary.h"
 #include "platform/resources/ExResource.h"
 
 #include <QSqlDatabase>
@@ -139,6 +140,8 @@ SqlConnection::~SqlConnection() = default;
 void SqlConnection::open(IfAbsent ifAbsent)
 {
     giveUp();
+    if (const Kdd::Result loaded = Kdd::loadLate(Kdd::LateLibrary::Database); loaded.bad())
+        throw DatabaseError(loaded.text());
     const SqlDialect& dialect = SqlDialect::of(mAddress.engine);
     // Opening would only say that no driver is loaded.
     if (!QSqlDatabase::isDriverAvailable(dialect.driver))

@@ -1,9 +1,12 @@
 #include "platform/volume/FrameEncoding.h"
 
+#include "platform/late/LateLibrary.h"
 #include "platform/volume/FrameLayout.h"
+#include "platform/volume/jpegls/JpegLsEncoder.h"
 
 #include <QtEndian>
 
+#include <dcmtk/dcmdata/dccodec.h>
 #include <dcmtk/dcmdata/dcdeftag.h>
 #include <dcmtk/dcmdata/dcitem.h>
 #include <dcmtk/dcmdata/dcpixel.h>
@@ -14,7 +17,6 @@
 #include <dcmtk/dcmjpeg/djcparam.h>
 #include <dcmtk/dcmjpeg/djeijg16.h>
 #include <dcmtk/dcmjpeg/djeijg8.h>
-#include <dcmtk/dcmjpls/djcodece.h>
 #include <dcmtk/dcmjpls/djcparam.h>
 #include <dcmtk/dcmjpls/djrparam.h>
 
@@ -126,7 +128,6 @@ void describe(const FrameLayout& layout, DcmItem& item)
 
 Result encodeJpegLs(QByteArray pixels, const FrameLayout& layout, QByteArray& bytes)
 {
-    const DJLSLosslessEncoder codec;
     const DJLSRepresentationParameter wanted;
     const DJLSCodecParameter parameters(OFFalse, 0, 0, 0, 0, 0, OFFalse, EJLSUC_never);
     DcmItem item;
@@ -140,8 +141,9 @@ Result encodeJpegLs(QByteArray pixels, const FrameLayout& layout, QByteArray& by
     pixels.append(pixels.size() % 2, '\0');
     DcmPixelSequence* made = nullptr;
     OFBool isReplaced = OFFalse;
-    const OFCondition condition = codec.encode(reinterpret_cast<const Uint16*>(pixels.constData()), length,
-                                               &wanted, made, &parameters, place, isReplaced);
+    const OFCondition condition =
+        jpegLsEncoder().encode(reinterpret_cast<const Uint16*>(pixels.constData()), length, &wanted, made,
+                               &parameters, place, isReplaced);
     const std::unique_ptr<DcmPixelSequence> owned(made);
     DcmPixelItem* fragment = nullptr;
     Uint8* value = nullptr;
@@ -174,6 +176,9 @@ Result encodeFrame(FrameCoding coding, const QByteArray& pixels, const FrameLayo
         return Result::failure(QStringLiteral("Pixels of %1 bits and %2 bytes cannot be compressed")
                                    .arg(layout.bitsAllocated)
                                    .arg(pixels.size()));
+    const Result loaded = coding == FrameCoding::Rle ? Result() : loadLate(LateLibrary::Codecs);
+    if (loaded.bad())
+        return loaded;
     switch (coding) {
     case FrameCoding::JpegLossless:
         return encodeJpegLossless(pixels, layout, bytes);

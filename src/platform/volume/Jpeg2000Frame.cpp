@@ -1,3 +1,4 @@
+#include "platform/late/LateLibrary.h"
 #include "platform/volume/CompressedFrame.h"
 #include "platform/volume/FrameLayout.h"
 #include "platform/volume/NativeFrame.h"
@@ -227,6 +228,9 @@ StoredFrame::Colour colourOf(const Jpeg2000Decoder& decoder, const FrameLayout& 
 
 Result decodeJpeg2000(const QByteArray& bytes, const FrameLayout& layout, int least, StoredFrame& out)
 {
+    const Result loaded = loadLate(LateLibrary::Codecs);
+    if (loaded.bad())
+        return loaded;
     Jpeg2000Decoder decoder(bytes);
     Result header = decoder.readHeader(layout);
     if (header.bad())

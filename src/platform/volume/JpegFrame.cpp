@@ -1,3 +1,4 @@
+#include "platform/late/LateLibrary.h"
 #include "platform/volume/CompressedFrame.h"
 #include "platform/volume/FrameLayout.h"
 #include "platform/volume/NativeFrame.h"
@@ -212,6 +213,8 @@ Result decodeJpeg(const QByteArray& bytes, const FrameLayout& layout, StoredFram
     if (header.xfer == EXS_Unknown)
         return Result::failure(QStringLiteral("JPEG data of a kind that cannot be decoded"));
     Result fits = checkCodestream(layout, header.columns, header.rows, header.samples, header.precision);
+    if (fits.good())
+        fits = loadLate(LateLibrary::Codecs);
     if (fits.bad())
         return fits;
     const auto type = header.precision > 8 ? PrimitiveType::UInt16 : PrimitiveType::UInt8;

@@ -1,17 +1,15 @@
 #include "platform/volume/KxCompressedDataMedia.h"
 
 #include "platform/base/LogFile.h"
+#include "platform/os/ModuleFile.h"
 #include "platform/os/PathName.h"
 #include "platform/os/RandomAccessFile.h"
 #include "platform/volume/ffmpeg/VideoModule.h"
 
-#include <QDir>
 #include <QFile>
-#include <QFileInfo>
 #include <QStringList>
 
 #include <dlfcn.h>
-#include <link.h>
 
 #include <algorithm>
 #include <cmath>
@@ -53,32 +51,12 @@ private:
     qint64 mSize = 0;
 };
 
-/// The folder of the library or program that holds this code.
-QString ownFolder()
+/// Who says where the module is gets it from nowhere else.
+QStringList videoFolders()
 {
-    Dl_info info = {};
-    link_map* map = nullptr;
-    const auto* here = reinterpret_cast<const void*>(&ownFolder);
-    if (::dladdr1(here, &info, reinterpret_cast<void**>(&map), RTLD_DL_LINKMAP) == 0 || map == nullptr)
-        return {};
-    // The program itself has no name there, and how it was called need not lead to its file.
-    const QString file =
-        *map->l_name == '\0' ? QStringLiteral("/proc/self/exe") : QFile::decodeName(map->l_name);
-    return QFileInfo(QFileInfo(file).canonicalFilePath()).path();
-}
-
-QStringList moduleFolders()
-{
-    // Who says where the module is gets it from nowhere else.
     if (qEnvironmentVariableIsSet("KDD_MODULE_FOLDER"))
         return {QFile::decodeName(qgetenv("KDD_MODULE_FOLDER"))};
-    const QString own = ownFolder();
-    QStringList folders = {own + QLatin1String("/kddlib")};
-    // Only what was not installed looks where it was built: elsewhere anybody might have made a folder of that name.
-    const QString build = QStringLiteral(KDD_BUILD_FOLDER "/");
-    if ((own + QLatin1Char('/')).startsWith(build))
-        folders.append(build + QLatin1String("kddlib"));
-    return folders;
+    return moduleFolders();
 }
 
 struct VideoModule
@@ -87,30 +65,19 @@ struct VideoModule
     QString reason;
 };
 
-VideoModule openModule(const QString& path)
+VideoModule findModule()
 {
     VideoModule module;
-    // All symbols now: one that is missing should be a message here and not the end of the process later.
-    void* handle = ::dlopen(QFile::encodeName(path).constData(), RTLD_NOW | RTLD_LOCAL);
-    void* entry = handle == nullptr ? nullptr : ::dlsym(handle, kVideoModuleEntry);
-    module.entry = reinterpret_cast<VideoModuleEntry>(entry);
-    if (entry == nullptr)
+    void* handle = nullptr;
+    const Result result =
+        openModule(QStringLiteral("video module"), QLatin1String(kVideoModuleFile), videoFolders(), handle);
+    module.reason = result.text();
+    if (result.good())
+        module.entry = reinterpret_cast<VideoModuleEntry>(::dlsym(handle, kVideoModuleEntry));
+    if (result.good() && module.entry == nullptr)
         module.reason =
             QStringLiteral("The video module cannot be loaded: %1").arg(QString::fromLocal8Bit(::dlerror()));
     return module;
-}
-
-VideoModule findModule()
-{
-    const QStringList folders = moduleFolders();
-    for (const QString& folder : folders) {
-        const QString path = QDir(folder).absoluteFilePath(QLatin1String(kVideoModuleFile));
-        // The first one found counts. When it cannot be loaded its reason is told and no other is tried.
-        if (QFileInfo::exists(path))
-            return openModule(path);
-    }
-    return {nullptr, QStringLiteral("The video module %1 is not installed in %2")
-                         .arg(QLatin1String(kVideoModuleFile), folders.join(QLatin1String(" or ")))};
 }
 
 // Nothing may be thrown through the decoders: they are C.

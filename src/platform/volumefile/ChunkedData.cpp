@@ -2,6 +2,7 @@
 
 #include "platform/volumefile/ChunkCoding.h"
 #include "platform/volumefile/VolumeFileFormat.h"
+#include "platform/volumefile/hdf5/OwnTypes.h"
 
 #include <array>
 
@@ -134,7 +135,7 @@ Result ChunkedData::create(hid_t group, const QByteArray& name, hid_t type, cons
     if (!setChunkBytes())
         return Result::failure(QStringLiteral("has chunks of more than %1 bytes").arg(kMaxChunkBytes));
     const Handle space(H5Screate_simple(dims.size(), dims.constData(), nullptr), H5Sclose);
-    const Handle properties(H5Pcreate(H5P_DATASET_CREATE), H5Pclose);
+    const Handle properties(H5Pcreate(ownType(OwnType::DatasetCreation)), H5Pclose);
     H5Pset_chunk(properties.id(), chunk.size(), chunk.constData());
     if (mIsShuffled)
         H5Pset_shuffle(properties.id());

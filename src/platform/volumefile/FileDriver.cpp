@@ -1,5 +1,7 @@
 #include "platform/volumefile/FileDriver.h"
 
+#include "platform/volumefile/hdf5/OwnTypes.h"
+
 #include <algorithm>
 #include <iterator>
 #include <limits>
@@ -119,7 +121,7 @@ Handle accessTo(ByteStore& store)
     static const H5FD_class_t sClass = driverClass();
     // Registered once for the process, since the library keeps it until it ends.
     static const hid_t sDriver = H5FDregister(&sClass);
-    Handle access(H5Pcreate(H5P_FILE_ACCESS), H5Pclose);
+    Handle access(H5Pcreate(ownType(OwnType::FileAccess)), H5Pclose);
     ByteStore* const info = &store;
     H5Pset_driver(access.id(), sDriver, &info);
     return access;

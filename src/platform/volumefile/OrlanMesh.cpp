@@ -1,8 +1,10 @@
 #include "platform/volumefile/OrlanMesh.h"
 
+#include "platform/late/LateLibrary.h"
 #include "platform/volumefile/LatticeFile.h"
 #include "platform/volumefile/ParameterFile.h"
 #include "platform/volumefile/ReadStore.h"
+#include "platform/volumefile/hdf5/OwnTypes.h"
 
 #include <cstring>
 #include <utility>
@@ -172,7 +174,8 @@ Result OrlanMesh::Private::readCounts(const QByteArray& section, QVector<quint64
     Result opened = data.open(dataSections.id(), section);
     if (opened.bad())
         return opened;
-    if (H5Tequal(data.type(), H5T_STD_U64LE) <= 0 || data.dims().size() != 1 || data.chunk() != data.dims())
+    if (H5Tequal(data.type(), ownType(OwnType::UInt64)) <= 0 || data.dims().size() != 1 ||
+        data.chunk() != data.dims())
         return Result::failure(QStringLiteral("is not one chunk of 64-bit counts"));
     // The bound holds before memory is taken; readChunk has its own for the bytes in the file.
     if (elementCount(data.dims(), kMaxCounts) == 0)
@@ -201,6 +204,9 @@ OrlanMesh::~OrlanMesh()
 
 std::unique_ptr<OrlanMesh> OrlanMesh::read(const QByteArray& path, Result& result)
 {
+    result = loadLate(LateLibrary::VolumeFiles).within(refusalOf(path));
+    if (result.bad())
+        return nullptr;
     const QuietErrors quiet;
     auto file = std::make_unique<FileToRead>();
     auto d = std::make_unique<Private>();
@@ -215,6 +221,9 @@ std::unique_ptr<OrlanMesh> OrlanMesh::read(const QByteArray& path, Result& resul
 
 std::unique_ptr<OrlanMesh> OrlanMesh::read(const QByteArray& bytes, const QByteArray& name, Result& result)
 {
+    result = loadLate(LateLibrary::VolumeFiles).within(refusalOf(name));
+    if (result.bad())
+        return nullptr;
     const QuietErrors quiet;
     auto d = std::make_unique<Private>();
     d->name = name;

@@ -1,8 +1,10 @@
 #include "platform/volumefile/OrlanMeshWriter.h"
 
+#include "platform/late/LateLibrary.h"
 #include "platform/volumefile/LatticeFile.h"
 #include "platform/volumefile/ParameterFile.h"
 #include "platform/volumefile/PartFile.h"
+#include "platform/volumefile/hdf5/OwnTypes.h"
 
 #include <algorithm>
 #include <vector>
@@ -114,6 +116,9 @@ OrlanMeshWriter::~OrlanMeshWriter()
 std::unique_ptr<OrlanMeshWriter> OrlanMeshWriter::create(const QByteArray& path, const Lattice& lattice,
                                                          Result& result)
 {
+    result = loadLate(LateLibrary::VolumeFiles);
+    if (result.bad())
+        return nullptr;
     const QuietErrors quiet;
     auto d = std::make_unique<Private>();
     d->path = path;
@@ -166,7 +171,7 @@ Result OrlanMeshWriter::writeDataSection(const QByteArray& name, const QVector<q
     ChunkedData data;
     const QVector<hsize_t> dims{static_cast<hsize_t>(counts.size())};
     if (result.good())
-        result = data.create(mPrivate->dataSections.id(), name, H5T_STD_U64LE, dims, dims);
+        result = data.create(mPrivate->dataSections.id(), name, ownType(OwnType::UInt64), dims, dims);
     const int size = counts.size() * static_cast<int>(sizeof(quint64));
     // Not a copy: the counts outlive the call.
     if (result.good())

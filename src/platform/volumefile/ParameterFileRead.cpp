@@ -1,5 +1,6 @@
 #include "platform/volumefile/ChunkedData.h"
 #include "platform/volumefile/ParameterFile.h"
+#include "platform/volumefile/hdf5/OwnTypes.h"
 
 #include <cstring>
 #include <optional>
@@ -14,9 +15,9 @@ std::optional<Parameter::Kind> findKind(hid_t type)
     if (H5Tget_class(type) == H5T_STRING && H5Tis_variable_str(type) == 0)
         return Parameter::Kind::Text;
     // To the last bit: a narrower or foreign number would be read into the wrong places.
-    if (H5Tequal(type, H5T_STD_I64LE) > 0)
+    if (H5Tequal(type, ownType(OwnType::Int64)) > 0)
         return Parameter::Kind::Integers;
-    if (H5Tequal(type, H5T_IEEE_F64LE) > 0)
+    if (H5Tequal(type, ownType(OwnType::Float64)) > 0)
         return Parameter::Kind::Reals;
     return {};
 }

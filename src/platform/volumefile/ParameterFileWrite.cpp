@@ -1,5 +1,6 @@
 #include "platform/volumefile/ChunkedData.h"
 #include "platform/volumefile/ParameterFile.h"
+#include "platform/volumefile/hdf5/OwnTypes.h"
 
 namespace Kdd::VolumeFile
 {
@@ -30,8 +31,10 @@ QByteArray bytesOf(const Parameter& parameter)
 Handle elementType(Parameter::Kind kind, int textLength)
 {
     if (kind != Parameter::Kind::Text)
-        return {H5Tcopy(kind == Parameter::Kind::Integers ? H5T_STD_I64LE : H5T_IEEE_F64LE), H5Tclose};
-    Handle type(H5Tcopy(H5T_C_S1), H5Tclose);
+        return {
+            H5Tcopy(kind == Parameter::Kind::Integers ? ownType(OwnType::Int64) : ownType(OwnType::Float64)),
+            H5Tclose};
+    Handle type(H5Tcopy(ownType(OwnType::Text)), H5Tclose);
     H5Tset_size(type.id(), static_cast<std::size_t>(textLength));
     // Filled up with zeros and not ended by one, so that every byte may be text.
     H5Tset_strpad(type.id(), H5T_STR_NULLPAD);

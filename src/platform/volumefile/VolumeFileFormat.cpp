@@ -1,5 +1,7 @@
 #include "platform/volumefile/VolumeFileFormat.h"
 
+#include "platform/volumefile/hdf5/OwnTypes.h"
+
 namespace Kdd::VolumeFile
 {
 
@@ -7,21 +9,21 @@ hid_t fileType(PrimitiveType type)
 {
     switch (type) {
     case PrimitiveType::UInt8:
-        return H5T_STD_U8LE;
+        return ownType(OwnType::UInt8);
     case PrimitiveType::Int8:
-        return H5T_STD_I8LE;
+        return ownType(OwnType::Int8);
     case PrimitiveType::UInt16:
-        return H5T_STD_U16LE;
+        return ownType(OwnType::UInt16);
     case PrimitiveType::Int16:
-        return H5T_STD_I16LE;
+        return ownType(OwnType::Int16);
     case PrimitiveType::Int32:
-        return H5T_STD_I32LE;
+        return ownType(OwnType::Int32);
     case PrimitiveType::UInt32:
-        return H5T_STD_U32LE;
+        return ownType(OwnType::UInt32);
     case PrimitiveType::Float64:
-        return H5T_IEEE_F64LE;
+        return ownType(OwnType::Float64);
     case PrimitiveType::Float32:
-        return H5T_IEEE_F32LE;
+        return ownType(OwnType::Float32);
     }
     return H5I_INVALID_HID;
 }

@@ -82,6 +82,7 @@ bool takeInRestored(const GlobalOptions& options, Kxg::Catalogue& database, bool
 
 Outcome workForever(const GlobalOptions& options, const BuildRequest& request)
 {
+    loadForLongRun();
     const ServerSignals received;
     StudyWorkers workers(request.jobs);
     workers.start();

@@ -1,8 +1,8 @@
 #include "tools/kdd/Commands.h"
-#include "tools/kdd/ContactSheet.h"
 #include "tools/kdd/Database.h"
 #include "tools/kdd/Report.h"
 #include "tools/kdd/Store.h"
+#include "tools/kdd/ToolModule.h"
 
 #include <QDir>
 
@@ -54,8 +54,8 @@ Outcome runPreviews(const GlobalOptions& options, const PreviewsRequest& request
     }
     if (!request.sheet.isEmpty()) {
         // Of all pictures in the folder, those of earlier runs included.
-        const Result result = writeContactSheet(folder, request.sheet);
-        isDone = succeeded(result) && isDone;
+        const ToolModule* module = toolModule();
+        isDone = module != nullptr && succeeded(module->writeContactSheet(folder, request.sheet)) && isDone;
     }
     if (options.json)
         printJson({{QStringLiteral("previews"), exported}});

@@ -1,13 +1,7 @@
-#include "server/Receiver.h"
-#include "tools/kdd/DimseOptions.h"
-#include "tools/kdd/Report.h"
-#include "tools/kdd/ServerSignals.h"
+#include "tools/kdd/Commands.h"
+#include "tools/kdd/ServeRequest.h"
+#include "tools/kdd/ToolModule.h"
 
-#include <QJsonObject>
-
-#include <kddlib/LogFile.h>
-
-#include <cstdio>
 #include <memory>
 
 namespace Kdd
@@ -16,37 +10,10 @@ namespace Kdd
 namespace
 {
 
-void tellAddress(const GlobalOptions& options, const Receiver& receiver)
-{
-    const QByteArray address = receiver.address().text();
-    if (options.json)
-        printJson({{QStringLiteral("dicom"), QString::fromLatin1(address)}});
-    else
-        std::printf("Associations at %s\n", address.constData());
-    std::fflush(stdout);
-}
-
 Outcome runReceive(const GlobalOptions& options, const DimseRequest& request)
 {
-    DimseOrder order;
-    ObjectRules objects;
-    if (!readDimse(request, order) || !readObjectRules(options, objects))
-        return Outcome::WrongUsage;
-    const ServerSignals received;
-    Result result;
-    const std::unique_ptr<Receiver> receiver =
-        Receiver::make(*order.settings, order.audit, order.isDecided, objects, result);
-    if (receiver != nullptr)
-        result = receiver->start();
-    if (result.bad()) {
-        LogFile::errorf("Cannot receive: %s", qUtf8Printable(result.text()));
-        return Outcome::Failed;
-    }
-    tellAddress(options, *receiver);
-    received.awaitEnd(
-        [&] { renewCertificate(receiver->hasCertificate(), [&] { return receiver->renewCertificate(); }); });
-    receiver->stop();
-    return Outcome::Done;
+    const ToolModule* module = toolModule();
+    return module != nullptr ? module->receive(options, request) : Outcome::Failed;
 }
 
 }  // namespace

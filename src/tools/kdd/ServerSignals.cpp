@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 #include <kddlib/LogFile.h>
+#include <kddlib/ModuleFile.h>
 #include <unistd.h>
 
 namespace Kdd
@@ -45,6 +46,12 @@ void ServerSignals::awaitEnd(const std::function<void()>& renew) const
     std::signal(SIGINT, SIG_DFL);
     std::signal(SIGTERM, SIG_DFL);
     ::pthread_sigmask(SIG_UNBLOCK, &mSignals, nullptr);
+}
+
+void loadForLongRun()
+{
+    if (const Result result = loadModules(); result.bad())
+        LogFile::warnf("%s", qUtf8Printable(result.text()));
 }
 
 void renewCertificate(bool hasCertificate, const std::function<Result()>& renew)

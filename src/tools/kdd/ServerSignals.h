@@ -26,6 +26,10 @@ private:
     sigset_t mFormer = {};
 };
 
+/// At the start of what runs until it is interrupted: all modules come from the installation that it was started with. One
+/// that is missing is a warning.
+void loadForLongRun();
+
 /// Has a server read its certificate anew, and tells what came of it.
 void renewCertificate(bool hasCertificate, const std::function<Result()>& renew);
 

@@ -228,7 +228,7 @@ QImage PreviewGenerator::createPreviewImage(DcmDataset* dataset, unsigned long w
         say(reason, withoutPath(result.text(), path));
         return {};
     }
-    QImage image = convertToQImage(info.get(), toInt(width), toInt(height));
+    const QImage image = convertToQImage(info.get(), toInt(width), toInt(height));
     if (image.isNull())
         say(reason,
             QStringLiteral("pixels of type %1 are not shown").arg(static_cast<int>(info->primitiveType())));
@@ -263,17 +263,20 @@ QImage PreviewGenerator::convertToQImage(const KxVolumeInfo* info, int width, in
         return {};
     const float center = (info->lowestValue() + info->highestValue()) * 0.5F;
     const QImage image = convertToQImage(info, center, info->highestValue() - info->lowestValue());
-    return image.isNull() ? image : fitted(image, info->pixelAspectRatio(), width, height);
+    if (image.isNull())
+        return image;
+    return fitted(image, info->pixelAspectRatio(), width, height);
 }
 
 QImage PreviewGenerator::convertToQImage(const KxVolumeInfo* info, float center, float width)
 {
-    if (info == nullptr || !info->previewHasPixels())
-        return {};
-    const Converter converter = converterFor(info->primitiveType());
-    QImage image(info->width(), info->height(), QImage::Format_RGB32);
-    if (converter == nullptr || image.isNull())
-        return {};
+    QImage image;
+    const bool hasPixels = info != nullptr && info->previewHasPixels();
+    const Converter converter = hasPixels ? converterFor(info->primitiveType()) : nullptr;
+    if (converter != nullptr)
+        image = QImage(info->width(), info->height(), QImage::Format_RGB32);
+    if (image.isNull())
+        return image;
     // Pixels of too few numbers are not converted and stay as they are here.
     image.fill(Qt::black);
     // A negative width has white at the low end.

@@ -10,6 +10,7 @@
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/Volume.h"
 #include "platform/base/LogFile.h"
+#include "platform/late/LateLibrary.h"
 #include "platform/os/PathName.h"
 #include "platform/volume/KxVolumeInfo.h"
 
@@ -203,6 +204,10 @@ bool addPreview(TagMap* image, DcmDataset* dataset, const QString& path)
 {
     if (image == nullptr)
         return false;
+    if (const Result loaded = loadLate(LateLibrary::Pictures); loaded.bad()) {
+        LogFile::warnf(kNotCreated, qUtf8Printable(path), qUtf8Printable(loaded.text()));
+        return false;
+    }
     const Vec2i size = TagFileSettings::previewSize();
     QString reason;
     const QImage preview = PreviewGenerator::createPreviewImage(
@@ -246,6 +251,11 @@ bool addPreview(const StudyTree& tree, DcmDataset* dataset, const QString& path)
 
 int exportPreviews(const StudyTree& tree, const QString& folder)
 {
+    if (const Result loaded = loadLate(LateLibrary::Pictures); loaded.bad()) {
+        LogFile::errorf("Previews cannot be written to %s: %s", qUtf8Printable(folder),
+                        qUtf8Printable(loaded.text()));
+        return 0;
+    }
     QString prefix = folder.isEmpty() ? QDir::currentPath() : folder;
     if (!prefix.endsWith(QLatin1Char('/')))
         prefix += QLatin1Char('/');

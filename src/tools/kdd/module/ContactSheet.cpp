@@ -1,4 +1,4 @@
-#include "tools/kdd/ContactSheet.h"
+#include "tools/kdd/module/ContactSheet.h"
 
 #include <QDir>
 #include <QImage>

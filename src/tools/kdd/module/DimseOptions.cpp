@@ -1,4 +1,4 @@
-#include "tools/kdd/DimseOptions.h"
+#include "tools/kdd/module/DimseOptions.h"
 
 #include "server/PeersFile.h"
 #include "tools/kdd/Store.h"
@@ -66,22 +66,6 @@ bool readPeers(const QString& named, DimseOrder& order)
 }
 
 }  // namespace
-
-void DimseRequest::addTo(ArgumentList& arguments)
-{
-    arguments.text(
-        {"--dicom", "PORT|ADDRESS:PORT", "Where to wait for DICOM associations (default: nowhere)"}, listen);
-    addRulesTo(arguments);
-}
-
-void DimseRequest::addRulesTo(ArgumentList& arguments)
-{
-    arguments.text(
-        {"--title", "AE[,AE]", "Application entity titles it answers to, \"*\" for any (default: KDD)"},
-        title);
-    arguments.path(
-        {"--peers", "FILE|none", "Who may have associations (default: all, from this machine only)"}, peers);
-}
 
 bool readDimse(const DimseRequest& request, DimseOrder& order)
 {

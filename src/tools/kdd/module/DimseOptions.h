@@ -1,26 +1,14 @@
 #pragma once
 
 #include "server/dimse/DimseSettings.h"
-#include "tools/kdd/Commands.h"
+#include "tools/kdd/ServeRequest.h"
 
 #include <kddlib/ObjectStore.h>
 
+#include <optional>
+
 namespace Kdd
 {
-
-/// What the command line says of associations; what is empty is left to the site's settings.
-struct DimseRequest
-{
-    QByteArray listen;
-    QByteArray title;
-    QString peers;
-
-    /// Declares `--dicom`, `--title` and `--peers`.
-    void addTo(ArgumentList& arguments);
-
-    /// All but where to listen.
-    void addRulesTo(ArgumentList& arguments);
-};
 
 /// What is wanted of associations.
 struct DimseOrder

@@ -1,0 +1,78 @@
+#include "CommandLineFixture.h"
+
+#include <QFileInfo>
+
+using namespace Kdd;
+
+namespace
+{
+
+/// The tool and the library as they would be installed, but without any module.
+class BareTool : public CommandLine
+{
+protected:
+    void SetUp() override
+    {
+        QDir().mkpath(path("bare"));
+        for (const char* file : {KDD_BINARY, KDD_LIBRARY}) {
+            const QString name = QFileInfo(QString::fromUtf8(file)).fileName();
+            ASSERT_TRUE(QFile::copy(QString::fromUtf8(file), path("bare/") + name));
+        }
+        addTwoStudies();
+    }
+
+    Answer run(const char* arguments) const
+    {
+        QProcess process;
+        QProcessEnvironment environment = QProcessEnvironment::systemEnvironment();
+        environment.insert(QStringLiteral("LD_LIBRARY_PATH"), path("bare"));
+        process.setProcessEnvironment(environment);
+        QStringList words =
+            QString::fromLatin1(arguments).replace(QLatin1Char('@'), images()).split(QLatin1Char(' '));
+        process.start(path("bare/kdd"), QStringList{QStringLiteral("--store"), path("store")} + words);
+        return finish(process);
+    }
+};
+
+const struct
+{
+    const char* arguments;
+    int exitCode;
+    const char* module;  // that is missed
+} kUses[] = {
+    {"--version", 0, ""},
+    {"stat 1.2 --json", 0, ""},
+    {"metadata 1.2", 0, ""},
+    {"show 1.2 --tree", 0, ""},
+    {"list", 1, "kdd-database.so"},
+    {"get http://127.0.0.1:9/a", 1, "kdd-curl.so"},
+    {"receive 0", 1, "kdd-tool.so"},
+};
+
+TEST_F(BareTool, ReadsTagFilesAndNamesWhatElseIsMissing)
+{
+    for (const auto& use : kUses) {
+        const Answer answer = run(use.arguments);
+        EXPECT_EQ(answer.exitCode, use.exitCode) << use.arguments << '\n' << answer.err.toStdString();
+        EXPECT_TRUE(answer.err.contains(use.module)) << use.arguments << '\n' << answer.err.toStdString();
+        EXPECT_EQ(answer.err.contains("is not installed in"), use.exitCode != 0) << use.arguments;
+    }
+}
+
+TEST_F(BareTool, TakesImagesWithoutTheirPictures)
+{
+    const QString module = QStringLiteral("/kddlib/kdd-database.so");
+    QDir().mkpath(path("bare/kddlib"));
+    ASSERT_TRUE(QFile::copy(QStringLiteral(KDD_BUILD_FOLDER) + module, path("bare") + module));
+    DatasetBuilder image = anImage("5").inStudy("1.4").with(DCM_Rows, "2").with(DCM_Columns, "2");
+    image.with(DCM_SamplesPerPixel, "1").with(DCM_PhotometricInterpretation, "MONOCHROME2");
+    image.with(DCM_BitsAllocated, "8").with(DCM_BitsStored, "8").with(DCM_HighBit, "7");
+    save("5", image.with(DCM_PixelRepresentation, "0").bytes({0, 1, 2, 3}));
+    const Answer answer = run("add --json @");
+    EXPECT_EQ(answer.exitCode, 0);
+    EXPECT_EQ(answer.number("images"), 1);
+    EXPECT_TRUE(answer.err.contains("kdd-pictures.so is not installed in")) << answer.err.toStdString();
+    EXPECT_EQ(imagesOf("1.4"), 1);
+}
+
+}  // namespace
