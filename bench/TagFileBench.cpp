@@ -13,6 +13,7 @@
 #include <benchmark/benchmark.h>
 #include <dcmtk/dcmdata/dctk.h>
 #include <dcmtk/oflog/oflog.h>
+#include <malloc.h>
 
 #include <vector>
 
@@ -144,6 +145,44 @@ void readTagFile(benchmark::State& state)
     countImagesOfStudies(state);
 }
 
+/// Of the heap [bytes].
+qint64 memoryInUse()
+{
+    const struct mallinfo2 use = mallinfo2();
+    return static_cast<qint64>(use.uordblks) + static_cast<qint64>(use.hblkhd);
+}
+
+/// All that every image shows.
+void walk(const TagFile& file)
+{
+    for (const TagMap* image : file.imagesByUID()) {
+        const TagMap::iterator end = image->end();
+        for (TagMap::iterator it = image->begin(); it != end; ++it)
+            benchmark::DoNotOptimize(it.value());
+    }
+}
+
+/// A study that is read and looked into as a whole, and how many times its uncompressed size it takes before and after.
+void walkTagFile(benchmark::State& state)
+{
+    const QByteArray bytes = written(*optimised(static_cast<int>(state.range(0))));
+    for (auto step : state) {
+        state.PauseTiming();
+        const qint64 before = memoryInUse();
+        TagFile file;
+        read(file, bytes);
+        const double size = file.statistics().uncompressedSize;
+        state.counters["read/size"] = static_cast<double>(memoryInUse() - before) / size;
+        state.ResumeTiming();
+        walk(file);
+        state.PauseTiming();
+        state.counters["walked/size"] = static_cast<double>(memoryInUse() - before) / size;
+        file.clear();
+        state.ResumeTiming();
+    }
+    countImages(state, state.range(0));
+}
+
 void destroy(benchmark::State& state)
 {
     const QByteArray bytes = written(*optimised(static_cast<int>(state.range(1))));
@@ -212,8 +251,9 @@ BENCHMARK_CAPTURE(writeTagFile, lzma, TagFile::CompressionMode::Lzma)
     ->Arg(1000)
     ->Unit(benchmark::kMillisecond);
 BENCHMARK(readTagFile)->Args({1, 1000})->Args({20, 1000})->Args({1, 20000})->Unit(benchmark::kMillisecond);
+BENCHMARK(walkTagFile)->Arg(1000)->Arg(20000)->Unit(benchmark::kMillisecond);
 BENCHMARK(destroy)->Args({1, 1000})->Args({20, 1000})->Args({1, 20000})->Unit(benchmark::kMillisecond);
-BENCHMARK(mergeOneImage)->Arg(1000)->Arg(20000)->Unit(benchmark::kMillisecond);
+BENCHMARK(mergeOneImage)->Arg(1000)->Arg(5000)->Arg(20000)->Unit(benchmark::kMillisecond);
 BENCHMARK(findAttribute);
 
 }  // namespace

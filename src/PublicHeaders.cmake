@@ -60,6 +60,7 @@ set(KDD_PUBLIC_HEADERS
   core/kddlib/tagmodel/OwnAttributes.h
   core/kddlib/tagmodel/TagElement.h
   core/kddlib/tagmodel/TagMap.h
+  core/kddlib/tagmodel/TagMapIterator.h
   core/kddlib/tagmodel/TagSequence.h
   core/kddlib/tagmodel/VolumeHolder.h
   core/kddlib/tagmodel/VolumeImages.h

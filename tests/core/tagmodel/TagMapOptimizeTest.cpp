@@ -94,6 +94,20 @@ TEST(Optimize, EveryValueStandsWhereItIsCheapest)
     EXPECT_EQ(tree.held(), "- / - / -") << "a study forgets what no series shows";
 }
 
+TEST(Optimize, OfThousandsOfValuesTheMostFrequentIsShared)
+{
+    QByteArray values;
+    QByteArray left;
+    for (int i = 0; i < 3000; ++i) {
+        // Every value comes twice but one, which comes a third time.
+        values += (i > 0 ? " value" : "value") + QByteArray::number(i == 2999 ? 700 : i / 2);
+        left += ' ' + (i / 2 == 700 || i == 2999 ? "-" : "value" + QByteArray::number(i / 2));
+    }
+    const Tree tree("-", "-", values);
+    tree.series->optimizeAll();
+    EXPECT_EQ(tree.held(), "- / value700 /" + left.toStdString());
+}
+
 TEST(Optimize, ASeriesHidesAStudysValueAndKeepsItsOwnBytesButNoItems)
 {
     const Tree tree("X", "YY", "- Z ?");

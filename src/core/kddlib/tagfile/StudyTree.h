@@ -111,7 +111,11 @@ private:
 
         void insert(const QByteArray& key, TagMap* image)
         {
-            mInOrder.insert(key, image);
+            // Readers mostly bring them in order.
+            if (mInOrder.isEmpty() || mInOrder.lastKey() < key)
+                mInOrder.insert(mInOrder.cend(), key, image);
+            else
+                mInOrder.insert(key, image);
             mHashed.insert(key, image);
         }
 

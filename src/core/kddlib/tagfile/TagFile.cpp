@@ -95,9 +95,15 @@ std::shared_ptr<Item> TagFile::findImageEx(const QByteArray& sopUID, const QByte
     if (image == nullptr)
         return nullptr;
     // The item shares the study: what it shows must stay when the tag file is cleared or read anew.
-    const StudyTree::Studies& studies = d->tree().studies();
-    const auto study = studies.constFind(image->uid(TagMap::StudyLevel));
-    return study != studies.cend() ? std::make_shared<ItemTM>(*image, *study) : nullptr;
+    const TagMap* root = image;
+    while (root->parent() != nullptr)
+        root = root->parent();
+    // Found by the node, which takes no look-up of the UID in every node above the image.
+    for (const std::shared_ptr<TagMap>& study : d->tree().studies()) {
+        if (study.get() == root)
+            return std::make_shared<ItemTM>(*image, study);
+    }
+    return nullptr;
 }
 
 TagMap* TagFile::takeImage(const QByteArray& sopUID)

@@ -109,14 +109,16 @@ const char* TagMap::privateCreator(const DcmTagKey& key) const
 bool TagMap::findAndGetInt(const DcmTagKey& key, int& value) const
 {
     bool ok = false;
-    const TagElement* element = findElement(key);
+    TagElement copy;
+    const TagElement* element = findValue(key, copy);
     value = element != nullptr ? element->valueAsInt(&ok, 0) : 0;
     return ok;
 }
 
 bool TagMap::findAndGetString(const DcmTagKey& key, QByteArray& text) const
 {
-    const TagElement* element = findElement(key);
+    TagElement copy;
+    const TagElement* element = findValue(key, copy);
     if (element == nullptr)
         return false;
     if (element->vr() == VrCode::UN && isPrivate(key))
@@ -142,7 +144,7 @@ TagElement* TagMap::putElement(const DcmTagKey& key, TagElement* element)
 {
     // The former element goes last, when the key points at the new one already, for the new one may have been
     // made from it. What is put where it stands must not go at all.
-    TagElement*& place = mTags[key];
+    TagElement*& place = tagsForLevel()[key];
     const std::unique_ptr<TagElement> replaced(place != element ? place : nullptr);
     place = element;
     return element;
@@ -151,7 +153,8 @@ TagElement* TagMap::putElement(const DcmTagKey& key, TagElement* element)
 /// Data sets and records hold their keys in order, so the end of the map is nearly always the right place.
 void TagMap::putInOrder(const DcmTagKey& key, TagElement* element)
 {
-    if (mTags.isEmpty() || mTags.lastKey() < key)
+    const Tags& own = tagsForLevel();
+    if (own.isEmpty() || own.lastKey() < key)
         mTags.insert(mTags.cend(), key, element);
     else
         putElement(key, element);
@@ -159,7 +162,9 @@ void TagMap::putInOrder(const DcmTagKey& key, TagElement* element)
 
 bool TagMap::deleteElement(const DcmTagKey& key)
 {
-    const auto at = mTags.find(key);
+    if (isEncoded() && !holdsEncoded(key))
+        return false;
+    const auto at = tagsForLevel().find(key);
     if (at == mTags.end())
         return false;
     delete at.value();

@@ -5,12 +5,14 @@
 #include "platform/base/Export.h"
 
 #include <QByteArray>
+#include <QExplicitlySharedDataPointer>
 #include <QList>
 #include <QMap>
 #include <QVector>
 
 #include <dcmtk/dcmdata/dctagkey.h>
 
+#include <atomic>
 #include <memory>
 #include <string>
 #include <vector>
@@ -26,6 +28,7 @@ class QTextStream;
 namespace Kdd
 {
 
+class EncodedElements;
 class KxMsg;
 class TagElement;
 class TagSequence;
@@ -43,6 +46,8 @@ class VolumeImages;
 ///
 /// Maps made by the copy constructor or assignment share elements, children and volumes with their source without
 /// owning them and must not outlive it; `clone()` is the deep copy. Used by one thread at a time.
+///
+/// A node that was read from a tag file takes its elements out of the file's bytes when they are first asked for.
 class KDD_EXPORT TagMap
 {
 public:
@@ -70,8 +75,18 @@ public:
     bool isSequenceItem() const { return mIsSequenceItem; }
 
     /// The node's own elements only. Whoever takes an element out owns it.
-    Tags& tagsForLevel() { return mTags; }
-    const Tags& tagsForLevel() const { return mTags; }
+    Tags& tagsForLevel()
+    {
+        if (isEncoded())
+            decode();
+        return mTags;
+    }
+    const Tags& tagsForLevel() const
+    {
+        if (isEncoded())
+            decode();
+        return mTags;
+    }
 
     /// Attaches `child` and takes it over (an item stays with its sequence). What the child shares with this node is
     /// dropped from the child, what it lacks is marked missing in it; a first child gives all it has to this node.
@@ -274,7 +289,18 @@ protected:
 
 private:
     enum class Match { Bytes, BytesAndVr };
-    using Elements = std::vector<const TagElement*>;
+    struct Held;
+    class HeldValues;
+
+    /// Leaves the own elements, of which there are none yet, where they stand until they are asked for. None of their
+    /// sequences may have items that inherit.
+    void keepEncoded(const EncodedElements& elements, int place);
+    bool isEncoded() const { return mEncoded.load(std::memory_order_acquire) != nullptr; }
+    QExplicitlySharedDataPointer<const EncodedElements> encoded() const;
+    void decode() const;
+    void dropEncoded();
+    bool holdsEncoded(const DcmTagKey& key) const;
+    const TagElement* findValue(const DcmTagKey& key, TagElement& copy) const;
 
     static TagMap* createTagMap(DcmItem* item, unsigned int maxLength, int depth);
     TagSequence* setSequence(DcmSequenceOfItems* sequence, unsigned int maxLength, int depth);
@@ -290,6 +316,7 @@ private:
     void dropWhatParentShows(const TagMap& parent);
     static void attachItems(const TagSequence& parentSequence, const TagSequence& childSequence);
     void standAlone();
+    bool mayRelinkEncoded(const EncodedElements& elements) const;
     void relinkOwnItems();
     void hangBelow(TagMap* item);
     void forgetParent();
@@ -302,14 +329,18 @@ private:
     QList<Volume*>& obtainVolumes();
     void releaseAll();
 
-    TagElement* ownElement(const DcmTagKey& key) const { return mTags.value(key, nullptr); }
+    /// A node that does not hold the key stays encoded.
+    TagElement* ownElement(const DcmTagKey& key) const
+    {
+        return isEncoded() && !holdsEncoded(key) ? nullptr : tagsForLevel().value(key, nullptr);
+    }
     bool holdsSequence(const DcmTagKey& key) const;
     TagElement* plainElement(const DcmTagKey& key);
     void putInOrder(const DcmTagKey& key, TagElement* element);
 
     static bool equals(const TagElement& element, VrCode vr, const QByteArray& value, Match match);
     void storeHere(const DcmTagKey& key, VrCode vr, QByteArray value, Match match);
-    void place(const DcmTagKey& key, const Elements& held);
+    void place(const DcmTagKey& key, const std::vector<Held>& held);
     void forgetUnseen(const DcmTagKey& key, bool childrenAreMarked);
 
     /// What the reading of one tag file's records shares.
@@ -330,6 +361,8 @@ private:
     };
 
     void serialize(KxMsg& out, WriteContext& context) const;
+    static bool countElements(KxMsg& out, int count, WriteContext& context);
+    static void writeAgain(KxMsg& out, const QByteArray& record, int count, WriteContext& context);
     static void writeElement(KxMsg& out, const DcmTagKey& key, const TagElement& element,
                              WriteContext& context);
     static void refuse(KxMsg& out, WriteContext& context, const char* reason);
@@ -348,47 +381,15 @@ private:
     QList<TagMap*> mChildren;
     std::unique_ptr<VolumeHolder> mVolumes;  // null without volumes
     QVector<VolumePlace> mVolumePlaces;
-    Tags mTags;
+    mutable Tags mTags;  // empty while encoded
+    mutable std::atomic<const EncodedElements*> mEncoded{nullptr};
+    int mPlace = 0;  // of the elements there
     bool mIsSequenceItem = false;
     bool mIsInSequence = false;  // an item may also be the copy of one, which belongs to no sequence
     bool mIsTakenOut = false;    // no child of `mParent` any more
     bool mOwns = true;
 };
 
-/// Walks the merged view of a node, its parent and its grandparent in key order, each key once with the nearest
-/// node's element, missing ones skipped. Valid until one of the three own maps changes. Used by the thread that uses
-/// the tree.
-class KDD_EXPORT TagMap::iterator
-{
-public:
-    iterator() = default;
-
-    const DcmTagKey& key() const { return mLevels[mCurrent].at.key(); }
-    TagElement* value() const { return mLevels[mCurrent].at.value(); }
-    iterator& operator++();
-    bool operator==(const iterator& other) const;
-    bool operator!=(const iterator& other) const { return !(*this == other); }
-
-private:
-    friend class TagMap;
-
-    static constexpr int kLevels = 3;
-
-    struct Cursor
-    {
-        Tags::const_iterator at;
-        Tags::const_iterator end;
-        bool atEnd() const { return at == end; }
-    };
-
-    bool atEnd() const { return mCount == 0 || mLevels[mCurrent].atEnd(); }
-    void choose();
-    void step();
-    void skipMissing();
-
-    Cursor mLevels[kLevels];
-    int mCount = 0;
-    int mCurrent = 0;
-};
-
 }  // namespace Kdd
+
+#include "kddlib/tagmodel/TagMapIterator.h"

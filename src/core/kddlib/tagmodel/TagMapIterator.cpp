@@ -54,7 +54,7 @@ TagMap::iterator TagMap::begin() const
 {
     iterator it;
     for (const TagMap* node = this; node != nullptr && it.mCount < iterator::kLevels; node = node->mParent)
-        it.mLevels[it.mCount++] = {node->mTags.cbegin(), node->mTags.cend()};
+        it.mLevels[it.mCount++] = {node->tagsForLevel().cbegin(), node->tagsForLevel().cend()};
     it.choose();
     it.skipMissing();
     return it;
@@ -70,7 +70,7 @@ TagMap::iterator TagMap::lowerBound(const DcmTagKey& key) const
 {
     iterator it;
     for (const TagMap* node = this; node != nullptr && it.mCount < iterator::kLevels; node = node->mParent)
-        it.mLevels[it.mCount++] = {node->mTags.lowerBound(key), node->mTags.cend()};
+        it.mLevels[it.mCount++] = {node->tagsForLevel().lowerBound(key), node->tagsForLevel().cend()};
     it.choose();
     it.skipMissing();
     return it;

@@ -1,10 +1,9 @@
-#include "kddlib/tagmodel/TagMap.h"
+#include "kddlib/tagmodel/HeldValues.h"
 #include "kddlib/tagmodel/TagSequence.h"
 
 #include <dcmtk/dcmdata/dcdeftag.h>
 
 #include <cstring>
-#include <unordered_map>
 #include <utility>
 #include <vector>
 
@@ -21,54 +20,23 @@ constexpr qint64 kMissingCost = 5;
 // Each modification of an object adds an item, so the sequence has no bound of its own.
 constexpr int kOriginalAttributesKept = 4;
 
-qint64 costOf(const TagElement& element)
-{
-    return element.value().size() + kElementCost;
-}
-
-struct HashOfValue
-{
-    std::size_t operator()(const TagElement* element) const
-    {
-        return qHash(element->value(), static_cast<uint>(element->vr()));
-    }
-};
-
-struct SameValue
-{
-    bool operator()(const TagElement* left, const TagElement* right) const
-    {
-        return left->vr() == right->vr() && left->value() == right->value();
-    }
-};
-
-/// By length, bytes and VR: of equally frequent values the first is the cheapest.
-bool comesFirst(const TagElement& left, const TagElement& right)
-{
-    const QByteArray& mine = left.value();
-    const QByteArray& theirs = right.value();
-    if (mine.size() != theirs.size())
-        return mine.size() < theirs.size();
-    const int order =
-        std::memcmp(mine.constData(), theirs.constData(), static_cast<std::size_t>(mine.size()));
-    return order != 0 ? order < 0 : left.vr() < right.vr();
-}
-
 /// What the children of a node see under one key, and what that costs where it stands now.
+template <typename Held>
 class Survey
 {
 public:
     /// `held` is what children hold themselves, `shown` what the node shows and the other children see.
-    Survey(const std::vector<const TagElement*>& held, const TagElement* shown, int children)
+    Survey(const std::vector<Held>& held, const Held* shown, int children)
     {
-        mCosts.reserve(held.size());
+        std::size_t count = 4;
+        while (count < 2 * (held.size() + 1))
+            count *= 2;
+        mSlots.assign(count, -1);
         for (std::size_t i = 0; i < held.size(); ++i) {
-            // The elements lie all over the memory; without a hint most of the time is spent waiting for them.
-            if (i + 2 * kLookAhead < held.size())
-                __builtin_prefetch(held[i + 2 * kLookAhead]);
+            // Equal values lie all over the memory; without a hint most of the time is spent waiting for them.
             if (i + kLookAhead < held.size())
-                __builtin_prefetch(held[i + kLookAhead]->value().constData());
-            add(*held[i]);
+                __builtin_prefetch(held[i + kLookAhead].bytes);
+            add(held[i]);
         }
         // What children inherit costs nothing where it stands, but would have to be held by each if it went.
         const int inheriting = children - static_cast<int>(held.size());
@@ -77,27 +45,18 @@ public:
             return;
         mCurrent += costOf(*shown);
         // An inherited value that is a sequence makes the key one, even if no child holds it.
-        mIsSequence = mIsSequence || shown->vr() == VrCode::SQ;
+        mIsSequence = mIsSequence || shown->vr == VrCode::SQ;
         if (inheriting > 0)
-            mCosts[shown] += inheriting * costOf(*shown);
+            addCost(*shown, inheriting * costOf(*shown));
     }
 
     bool isSequence() const { return mIsSequence; }
     bool isMissing() const { return mMissing > 0; }
-    bool seesNothing() const { return mCosts.empty(); }
+    bool seesNothing() const { return mValues.empty(); }
 
-    /// The value that costs the children most; there has to be one. Of several the first by a fixed order, because the
-    /// table has none and a study must be written to the same bytes every time.
-    const TagElement& best() const
-    {
-        auto best = mCosts.cbegin();
-        for (auto it = mCosts.cbegin(); it != mCosts.cend(); ++it) {
-            if (it->second > best->second ||
-                (it->second == best->second && comesFirst(*it->first, *best->first)))
-                best = it;
-        }
-        return *best->first;
-    }
+    /// The value that costs the children most; there has to be one. Of several the first by a fixed order, because a study
+    /// must be written to the same bytes every time.
+    const Held& best() const { return *bestEntry().value; }
 
     qint64 currentCost() const { return mCurrent; }
 
@@ -105,33 +64,88 @@ public:
     qint64 costBelow() const
     {
         qint64 total = 0;
-        for (const auto& entry : mCosts)
-            total += entry.second;
+        for (const Entry& entry : mValues)
+            total += entry.cost;
         return total;
     }
 
-    /// When the node holds `value` and children only what differs.
-    qint64 costWith(const TagElement& value) const
+    /// When the node holds the best value and children only what differs.
+    qint64 costHere() const
     {
-        return costBelow() - mCosts.at(&value) + costOf(value) + kMissingCost * mAbsent;
+        const Entry& entry = bestEntry();
+        return costBelow() - entry.cost + costOf(*entry.value) + kMissingCost * mAbsent;
     }
 
 private:
     static constexpr std::size_t kLookAhead = 8;
 
-    void add(const TagElement& own)
+    /// What one value costs the children together.
+    struct Entry
     {
-        if (own.markedAsMissing()) {
+        const Held* value;
+        qint64 cost;
+    };
+
+    static qint64 costOf(const Held& value) { return value.size + kElementCost; }
+
+    static int compareBytes(const Held& left, const Held& right)
+    {
+        return left.size == 0 ? 0 : std::memcmp(left.bytes, right.bytes, static_cast<std::size_t>(left.size));
+    }
+
+    static bool isSame(const Held& left, const Held& right)
+    {
+        return left.hash == right.hash && left.vr == right.vr && left.size == right.size &&
+               compareBytes(left, right) == 0;
+    }
+
+    /// By length, bytes and VR: of equally frequent values the first is the cheapest.
+    static bool comesFirst(const Held& left, const Held& right)
+    {
+        if (left.size != right.size)
+            return left.size < right.size;
+        const int order = compareBytes(left, right);
+        return order != 0 ? order < 0 : left.vr < right.vr;
+    }
+
+    const Entry& bestEntry() const
+    {
+        const Entry* best = &mValues.front();
+        for (const Entry& entry : mValues) {
+            if (entry.cost > best->cost ||
+                (entry.cost == best->cost && comesFirst(*entry.value, *best->value)))
+                best = &entry;
+        }
+        return *best;
+    }
+
+    void add(const Held& own)
+    {
+        if (own.vr == VrCode::Missing) {
             ++mMissing;
             mCurrent += kMissingCost;
             return;
         }
         mCurrent += costOf(own);
-        mCosts[&own] += costOf(own);
-        mIsSequence = mIsSequence || own.vr() == VrCode::SQ;
+        addCost(own, costOf(own));
+        mIsSequence = mIsSequence || own.vr == VrCode::SQ;
     }
 
-    std::unordered_map<const TagElement*, qint64, HashOfValue, SameValue> mCosts;  // children's cost by value
+    /// A table without removal, in which whatever has no free slot stands in one of the next.
+    void addCost(const Held& value, qint64 cost)
+    {
+        std::size_t slot = value.hash & (mSlots.size() - 1);
+        while (mSlots[slot] >= 0 && !isSame(*mValues[static_cast<std::size_t>(mSlots[slot])].value, value))
+            slot = (slot + 1) & (mSlots.size() - 1);
+        if (mSlots[slot] < 0) {
+            mSlots[slot] = static_cast<int>(mValues.size());
+            mValues.push_back({&value, 0});
+        }
+        mValues[static_cast<std::size_t>(mSlots[slot])].cost += cost;
+    }
+
+    std::vector<Entry> mValues;
+    std::vector<int> mSlots;  // of values by their hash, -1 where there is none
     qint64 mCurrent = 0;
     int mMissing = 0;
     int mAbsent = 0;
@@ -155,24 +169,21 @@ DcmTagKey ownKey(const DcmTagKey& key)
     return {key.getGroup(), key.getElement()};
 }
 
-quint32 packed(const DcmTagKey& key)
-{
-    return static_cast<quint32>(key.getGroup()) << 16 | key.getElement();
-}
-
-DcmTagKey unpacked(quint32 key)
-{
-    return {static_cast<Uint16>(key >> 16), static_cast<Uint16>(key & 0xffff)};
-}
-
 }  // namespace
 
 void TagMap::optimize(const DcmTagKey& key)
 {
-    Elements held;
+    std::vector<Held> held;
+    std::vector<EncodedElements::Pointer> kept;
     for (const TagMap* child : qAsConst(mChildren)) {
-        if (const TagElement* own = child->ownElement(key))
-            held.push_back(own);
+        if (const EncodedElements::Pointer elements = child->encoded()) {
+            EncodedElements::Value value{};
+            if (elements->find(child->mPlace, key, value))
+                held.emplace_back(value);
+            kept.push_back(elements);
+        } else if (const TagElement* own = child->ownElement(key)) {
+            held.emplace_back(*own);
+        }
     }
     place(ownKey(key), held);
 }
@@ -183,25 +194,27 @@ void TagMap::optimizeAll()
 {
     if (mChildren.isEmpty())
         return;
-    std::unordered_map<quint32, Elements> heldByKey;
+    HeldValues values;
     // Keys that no child holds are looked at too: a marker here at
     // the root, for example, has nothing to hide.
-    for (auto it = mTags.cbegin(); it != mTags.cend(); ++it)
-        heldByKey[packed(it.key())];
-    for (const TagMap* child : qAsConst(mChildren)) {
-        for (auto it = child->mTags.cbegin(); it != child->mTags.cend(); ++it)
-            heldByKey[packed(it.key())].push_back(it.value());
-    }
-    for (const auto& [key, held] : heldByKey)
-        place(unpacked(key), held);
+    const Tags& own = tagsForLevel();
+    for (auto it = own.cbegin(); it != own.cend(); ++it)
+        values.addKey(it.key());
+    for (const TagMap* child : qAsConst(mChildren))
+        values.add(*child);
+    for (const HeldValues::Entry& entry : values.entries())
+        place(unpackedKey(entry.key), entry.held);
 }
 
 /// `held` is what the children hold themselves under the key.
-void TagMap::place(const DcmTagKey& key, const Elements& held)
+void TagMap::place(const DcmTagKey& key, const std::vector<Held>& held)
 {
     if (mChildren.isEmpty())
         return;
-    const Survey survey(held, findElement(key), mChildren.size());
+    std::vector<Held> shown;
+    if (const TagElement* element = findElement(key))
+        shown.emplace_back(*element);
+    const Survey<Held> survey(held, shown.empty() ? nullptr : shown.data(), mChildren.size());
     // Sequences have items and no bytes, so their cost is not known; attaching has placed them.
     if (survey.isSequence())
         return;
@@ -209,15 +222,14 @@ void TagMap::place(const DcmTagKey& key, const Elements& held)
         forgetUnseen(key, survey.isMissing());
         return;
     }
-    const TagElement& best = survey.best();
-    const qint64 costHere = survey.costWith(best);
+    const qint64 costHere = survey.costHere();
     const qint64 costBelow = survey.costBelow();
     // Only for a gain: at equal cost everything stays, so that a second pass finds nothing to move.
     if (costBelow < costHere && costBelow < survey.currentCost())
         storeOptionA(key);
     else if (costHere < survey.currentCost())
-        // The bytes are held on to, because the child that `best` belongs to loses it on the way.
-        storeHere(key, best.vr(), QByteArray(best.value()), Match::BytesAndVr);
+        // The bytes are held on to, because the child that the value belongs to loses it on the way.
+        storeHere(key, survey.best().vr, survey.best().value(), Match::BytesAndVr);
 }
 
 /// No child sees a value: at the root of the tree nothing needs to be hidden either.
@@ -297,12 +309,13 @@ void TagMap::storeHere(const DcmTagKey& key, VrCode vr, QByteArray value, Match 
 
 void TagMap::removeTagsNotNeededByClient()
 {
-    for (auto it = mTags.begin(); it != mTags.end();) {
+    Tags& own = tagsForLevel();
+    for (auto it = own.begin(); it != own.end();) {
         if (isNeededByClient(it.key(), *it.value())) {
             ++it;
         } else {
             delete it.value();
-            it = mTags.erase(it);
+            it = own.erase(it);
         }
     }
     TagElement* original = ownElement(DCM_OriginalAttributesSequence);

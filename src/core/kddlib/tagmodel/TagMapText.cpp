@@ -134,7 +134,8 @@ void TagMap::dump(QTextStream& out, int indent) const
 void TagMap::listContent(QTextStream& out, int indent) const
 {
     Lister lister(out, *this, indent, kListing);
-    for (auto it = mTags.cbegin(); it != mTags.cend(); ++it)
+    const Tags& own = tagsForLevel();
+    for (auto it = own.cbegin(); it != own.cend(); ++it)
         lister.element(it.key(), *it.value());
 }
 

@@ -1,9 +1,12 @@
+#include "kddlib/tagmodel/EncodedElements.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/tagmodel/TagSequence.h"
 
 #include <dcmtk/dcmdata/dcdeftag.h>
 
+#include <algorithm>
 #include <memory>
+#include <vector>
 
 namespace Kdd
 {
@@ -43,7 +46,7 @@ TagMap::TagMap(const TagMap& other)
     : mParent(other.mParent)
     , mChildren(other.mChildren)
     , mVolumes(other.mVolumes != nullptr ? other.mVolumes->share() : nullptr)
-    , mTags(other.mTags)
+    , mTags(other.tagsForLevel())
     , mIsSequenceItem(other.mIsSequenceItem)
     , mIsTakenOut(true)
     , mOwns(false)
@@ -54,8 +57,9 @@ TagMap& TagMap::operator=(const TagMap& other)
 {
     // A copy that is assigned back brings what is here; that stays with whom it belongs to. It is told by what it holds
     // and not by where it stands, because the copy of a copy brings the same.
-    const bool isEmpty = mTags.isEmpty() && mChildren.isEmpty() && volumes().isEmpty();
-    if (!isEmpty && mTags == other.mTags && mChildren == other.mChildren && volumes() == other.volumes())
+    const bool isEmpty = tagsForLevel().isEmpty() && mChildren.isEmpty() && volumes().isEmpty();
+    if (!isEmpty && mTags == other.tagsForLevel() && mChildren == other.mChildren &&
+        volumes() == other.volumes())
         return *this;
     if (this == &other)
         return *this;
@@ -64,7 +68,7 @@ TagMap& TagMap::operator=(const TagMap& other)
     mParent = other.mParent;
     mChildren = other.mChildren;
     mVolumes = other.mVolumes != nullptr ? other.mVolumes->share() : nullptr;
-    mTags = other.mTags;
+    mTags = other.tagsForLevel();
     mIsSequenceItem = other.mIsSequenceItem;
     mIsTakenOut = true;
     mOwns = false;
@@ -96,6 +100,7 @@ void TagMap::releaseAll()
         }
     }
     mChildren.clear();
+    dropEncoded();
     qDeleteAll(mTags);
     mTags.clear();
     forgetParent();
@@ -136,7 +141,7 @@ void TagMap::appendChild(TagMap* child)
 TagElement* TagMap::removeUID(Level level)
 {
     DcmTagKey key;
-    return uidKey(level, key) ? mTags.take(key) : nullptr;
+    return uidKey(level, key) ? tagsForLevel().take(key) : nullptr;
 }
 
 void TagMap::insertUID(Level level, TagElement* uid)
@@ -149,7 +154,8 @@ void TagMap::insertUID(Level level, TagElement* uid)
 QByteArray TagMap::uid(Level level) const
 {
     DcmTagKey key;
-    const TagElement* element = uidKey(level, key) ? findElement(key) : nullptr;
+    TagElement copy;
+    const TagElement* element = uidKey(level, key) ? findValue(key, copy) : nullptr;
     if (element == nullptr)
         return {};
     QByteArray text = element->value();
@@ -195,9 +201,9 @@ TagMap* TagMap::becomeItem()
 
 void TagMap::adoptFrom(TagMap* child)
 {
-    qDeleteAll(mTags);
+    qDeleteAll(tagsForLevel());
     mTags.clear();
-    mTags.swap(child->mTags);
+    mTags.swap(child->tagsForLevel());
     // A series that has lost all its images still hangs below its study: without this step the new image would
     // inherit whatever the study shows and the image lacks.
     if (mParent != nullptr)
@@ -207,7 +213,7 @@ void TagMap::adoptFrom(TagMap* child)
 /// Both sides are walked once, in key order: looking each key up would cost a walk up the tree for every one.
 void TagMap::dropWhatParentShows(const TagMap& parent)
 {
-    auto own = mTags.begin();
+    auto own = tagsForLevel().begin();
     const iterator end = parent.end();
     for (iterator shown = parent.begin(); shown != end; ++shown) {
         while (own != mTags.end() && own.key() < shown.key())
@@ -255,15 +261,19 @@ void TagMap::copyFromParent()
 {
     if (mParent == nullptr)
         return;
-    const Tags& above = mParent->mTags;
+    const Tags& above = mParent->tagsForLevel();
+    Tags& own = tagsForLevel();
     for (auto it = above.cbegin(); it != above.cend(); ++it) {
-        if (!mTags.contains(it.key()))
-            mTags.insert(it.key(), it.value()->clone());
+        if (!own.contains(it.key()))
+            own.insert(it.key(), it.value()->clone());
     }
 }
 
 void TagMap::detachItems()
 {
+    // Encoded ones hang nowhere.
+    if (isEncoded())
+        return;
     for (TagElement* element : qAsConst(mTags)) {
         const TagSequence* sequence = asSequence(element);
         for (int i = 0; sequence != nullptr && i < sequence->numItems(); ++i) {
@@ -303,9 +313,26 @@ void TagMap::relinkItems()
         child->relinkItems();
 }
 
+/// Whether the node above shows a sequence where this one holds one. It may have come there since this node was read.
+bool TagMap::mayRelinkEncoded(const EncodedElements& elements) const
+{
+    std::vector<DcmTagKey> sequences;
+    elements.visit(mPlace, [&](quint32 key, const EncodedElements::Value& value) {
+        if (value.vr == VrCode::SQ)
+            sequences.push_back(unpackedKey(key));
+    });
+    return std::any_of(sequences.begin(), sequences.end(), [this](const DcmTagKey& key) {
+        return mParent != nullptr && asSequence(mParent->findElement(key)) != nullptr;
+    });
+}
+
 void TagMap::relinkOwnItems()
 {
-    for (auto it = mTags.cbegin(); it != mTags.cend(); ++it) {
+    const EncodedElements::Pointer elements = encoded();
+    if (elements && !mayRelinkEncoded(*elements))
+        return;
+    const Tags& own = tagsForLevel();
+    for (auto it = own.cbegin(); it != own.cend(); ++it) {
         const TagSequence* sequence = asSequence(it.value());
         if (sequence == nullptr)
             continue;

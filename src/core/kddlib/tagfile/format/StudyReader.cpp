@@ -3,6 +3,7 @@
 #include "kddlib/Limits.h"
 #include "kddlib/tagfile/StudyTree.h"
 #include "kddlib/tagfile/TagFileSettings.h"
+#include "kddlib/tagfile/format/StudyBody.h"
 #include "kddlib/tagfile/format/TagFileFrame.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
@@ -22,6 +23,8 @@ namespace
 {
 
 constexpr int kReadChunk = 0x40000;
+// Each question to an encoded node goes through its elements one by one.
+constexpr int kMaxEncodedElements = 500;
 constexpr qint64 kMaxStoredBody = kMaxBodySize + kReadChunk;  // data that cannot be compressed grows a little
 
 const char* const kIncorrectHeader = "Tag file has incorrect header";
@@ -110,11 +113,14 @@ public:
     }
 
     /// False when the body is damaged.
-    bool read(KxMsg body)
+    bool read(const QByteArray& bytes)
     {
+        mBody = new StudyBody(bytes);
+        KxMsg body(bytes);
         while (body.remaining() > 0 && !body.failed()) {
             quint8 marker = 0;
             body >> marker;
+            mPlace = bytes.size() - body.remaining();
             const int length = TagMap::readLength(body);
             KxMsg record = body.readMessage(length);
             if (body.failed() || !take(marker, record))
@@ -173,7 +179,7 @@ private:
 
     bool takeImage(KxMsg& record)
     {
-        TagMap* image = readBelow(record, mSeries);
+        TagMap* image = readImage(record);
         const QByteArray key = StudyTree::imageKey(*image);
         // No file of ours holds an image twice; in a hostile one each would be searched for among its siblings.
         TagMap* replaced = mTree.imageUnder(key);
@@ -200,8 +206,24 @@ private:
         return node;
     }
 
+    /// Most images are never looked into, so each stays as it is in the body where that makes no difference to anybody.
+    TagMap* readImage(KxMsg& record)
+    {
+        const int elements =
+            mBody->countPlain(mPlace, *mSeries, qMin(mContext.elementsLeft, kMaxEncodedElements));
+        if (elements == 0)
+            return readBelow(record, mSeries);
+        mContext.elementsLeft -= elements;
+        auto* node = new TagMap;
+        mSeries->appendChild(node);
+        node->keepEncoded(*mBody, mPlace);
+        return node;
+    }
+
     StudyTree& mTree;
     const char* mWanted;
+    QExplicitlySharedDataPointer<const StudyBody> mBody;
+    int mPlace = 0;  // of the present record's elements in the body
     TagMap::RecordContext mContext;
     TagMap* mStudy = nullptr;
     TagMap* mSeries = nullptr;
@@ -242,7 +264,7 @@ Result readStudy(QDataStream& in, const StudyRequest& request, StudyTree& tree, 
         LogFile::printf("%s ends early: %d of %d previews are missing", qUtf8Printable(request.name),
                         sizes.missingBlobs, promised);
     StudyBodyReader reader(tree, request.studyUID, blobs);
-    if (body.size() > kMaxBodySize || !reader.read(KxMsg(body))) {
+    if (body.size() > kMaxBodySize || !reader.read(body)) {
         // Half a study must not be taken for a whole one and written back.
         tree.clear();
         sizes = {};

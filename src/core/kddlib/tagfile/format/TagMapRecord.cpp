@@ -1,4 +1,5 @@
 #include "kddlib/Limits.h"
+#include "kddlib/tagmodel/EncodedElements.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/tagmodel/TagSequence.h"
@@ -14,6 +15,8 @@ namespace
 
 constexpr int kLengthEscape = 65535;
 constexpr int kShortLength = 2;
+
+const char* const kTooLarge = "Tag file would be larger than the format allows";
 
 /// Writes what `write` appends as a record behind its length. The record goes straight to its place; only one that
 /// outgrows the short length code is moved.
@@ -91,15 +94,37 @@ void TagMap::serialize(KxMsg& out, QList<QByteArray>& blobs) const
 /// Counts as the reader does.
 void TagMap::serialize(KxMsg& out, WriteContext& context) const
 {
-    context.elementsLeft -= 1 + mTags.size();
-    if (context.elementsLeft < 0) {
-        refuse(out, context, "Tag file would hold more nodes, items and values than the format allows");
+    if (const EncodedElements::Pointer elements = encoded()) {
+        int count = 0;
+        writeAgain(out, elements->record(mPlace, count), count, context);
         return;
     }
+    const Tags& own = tagsForLevel();
+    if (!countElements(out, 1 + own.size(), context))
+        return;
     writeRecord(out, [&] {
-        for (auto it = mTags.cbegin(); it != mTags.cend() && !out.failed(); ++it)
+        for (auto it = own.cbegin(); it != own.cend() && !out.failed(); ++it)
             writeElement(out, it.key(), *it.value(), context);
     });
+}
+
+bool TagMap::countElements(KxMsg& out, int count, WriteContext& context)
+{
+    context.elementsLeft -= count;
+    if (context.elementsLeft < 0)
+        refuse(out, context, "Tag file would hold more nodes, items and values than the format allows");
+    return !out.failed();
+}
+
+/// A record as it was read.
+void TagMap::writeAgain(KxMsg& out, const QByteArray& record, int count, WriteContext& context)
+{
+    if (!countElements(out, count, context))
+        return;
+    if (qint64(out.position()) + record.size() > kMaxBodySize)
+        refuse(out, context, kTooLarge);
+    else
+        out.write(record);
 }
 
 void TagMap::refuse(KxMsg& out, WriteContext& context, const char* reason)
@@ -119,7 +144,7 @@ void TagMap::writeElement(KxMsg& out, const DcmTagKey& key, const TagElement& el
     }
     // Before it is appended: a message can hold no more than a little above the bound.
     if (qint64(out.position()) + element.value().size() > kMaxBodySize) {
-        refuse(out, context, "Tag file would be larger than the format allows");
+        refuse(out, context, kTooLarge);
         return;
     }
     writeKey(out, key, storedVr(element));
