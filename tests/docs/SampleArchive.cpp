@@ -74,9 +74,11 @@ QString SampleArchive::substituted(QString text) const
     text.replace(QRegularExpression(QStringLiteral("^(kdd (?:serve|receive)[^#]*)(#.*)?$")),
                  QStringLiteral("rm -f served; mkfifo served; KDD_SERVER_LISTEN=127.0.0.1:0 \\1 >served &\n"
                                 "read -r line <served; kill $!; wait $!"));
-    // A worker is interrupted as one is by hand.
-    text.replace(QRegularExpression(QStringLiteral("^(kdd build --forever[^#]*)(#.*)?$")),
-                 QStringLiteral("timeout --preserve-status --signal=INT 1 \\1"));
+    // A worker is asked to end as soon as it listens to that, which the mask of the signals that it catches tells.
+    text.replace(
+        QRegularExpression(QStringLiteral("^(kdd build --forever[^#]*)(#.*)?$")),
+        QStringLiteral("\\1 &\nuntil grep -q '^SigCgt:.*[4567cdef]...$' /proc/$!/status; do sleep 0.1; done\n"
+                       "kill $!; wait $!"));
     // The door builds and tests everything, this test included: here it only has to know the word.
     text.replace(QRegularExpression(QStringLiteral("^\\./dev (\\w+)")),
                  QStringLiteral(KDD_SOURCES "/dev | grep '^  \\1 '"));
