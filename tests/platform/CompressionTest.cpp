@@ -1,3 +1,4 @@
+#include "platform/compression/CompressedCosts.h"
 #include "platform/compression/LzmaCompress.h"
 #include "platform/compression/QxCompress.h"
 #include "support/ObjectServer.h"
@@ -7,6 +8,8 @@
 #include <QtEndian>
 
 #include <gtest/gtest.h>
+
+#include <array>
 
 using namespace Kdd;
 
@@ -82,6 +85,65 @@ TEST(QxCompress, IsTheFrameThatQtKnowsWithItsExactLength)
         QByteArray damaged = qxCompressed(kText);
         qToBigEndian(claim, damaged.data());
         EXPECT_TRUE(qxUncompress(damaged, qint64{1} << 40).isNull()) << claim;
+    }
+}
+
+struct CostCodec
+{
+    const char* name;
+    QByteArray (*compressed)(const QByteArray&);
+    bool (*costs)(const QByteArray&, const CostReceiver&);
+    int end;  // of the stream, which holds no content [bytes]
+};
+
+const CostCodec kCostCodecs[] = {{"Qx", qxCompressed, qxCosts, 4}, {"Lzma", lzmaCompress, lzmaCosts, 0}};
+
+TEST(CompressedCosts, AreThoseOfEachStretchAndAddUpToTheWhole)
+{
+    // Noise, what says nothing, and noise that was there before: where the bits are is plain.
+    const QByteArray noise = someObject(20000);
+    const QByteArray mixed = noise + QByteArray(10000, 'a') + noise;
+    for (const CostCodec& codec : kCostCodecs) {
+        SCOPED_TRACE(codec.name);
+        qint64 at = 0;
+        std::array<double, 3> bits = {};
+        const auto tell = [&](qint64 bytes, qint64 cost) {
+            bits.at(at < 20000 ? 0 : at < 30000 ? 1 : 2) += static_cast<double>(cost);
+            at += bytes;
+        };
+        EXPECT_TRUE(codec.costs(codec.compressed(mixed), tell));
+        EXPECT_EQ(at, mixed.size());
+        EXPECT_NEAR(bits[0], 160000, 6000);
+        EXPECT_LT(bits[1], 2000);
+        EXPECT_LT(bits[2], 8000);
+        // Of the few forms that a stream can have, with codes of its own, without, and not compressed at all.
+        for (const QByteArray& each :
+             {QByteArray("a"), kText, someObject(100000), QByteArray(1 << 20, '\0')}) {
+            const QByteArray whole = codec.compressed(each);
+            qint64 bytes = 0;
+            qint64 cost = 0;
+            const auto add = [&](qint64 more, qint64 moreCost) { bytes += more, cost += moreCost; };
+            EXPECT_TRUE(codec.costs(whole, add));
+            EXPECT_EQ(bytes, each.size());
+            EXPECT_LE(cost, whole.size() * 8);
+            EXPECT_GT(cost, (whole.size() - 11) * 8);
+        }
+    }
+}
+
+TEST(CompressedCosts, StopWhereAStreamIsCutOrDamaged)
+{
+    for (const CostCodec& codec : kCostCodecs) {
+        const QByteArray whole = codec.compressed(kText);
+        const auto ignore = [](qint64 /*bytes*/, qint64 /*bits*/) {};
+        for (int at = 0; at < whole.size(); ++at) {
+            EXPECT_TRUE(at >= whole.size() - codec.end || !codec.costs(whole.left(at), ignore)) << at;
+            for (const int flip : {0x01, 0x10, 0x80, 0xFF}) {
+                QByteArray damaged = whole;
+                damaged[at] = static_cast<char>(whole.at(at) ^ flip);
+                codec.costs(damaged, ignore);  // whatever it says, it comes to an end
+            }
+        }
     }
 }
 

@@ -25,6 +25,29 @@ TEST_F(CommandLine, TellsWhatItHolds)
     EXPECT_TRUE(kdd("metadata 1.2 --image 1").out.contains("\"0040A160\":{\"vr\":\"UT\",\"BulkDataURI\":"));
 }
 
+TEST_F(CommandLine, TellsWhereTheBytesOfTagFilesGo)
+{
+    addTwoStudies();
+    const int sizes[] = {kdd("stat 1.2 --json").number("fileSize"),
+                         kdd("stat 1.3 --json").number("fileSize")};
+    for (const auto& [studies, size] : {std::pair("1.2", sizes[0]), std::pair("", sizes[0] + sizes[1])}) {
+        const Answer answer = kdd(("stat --bytes --json " + QByteArray(studies)).constData());
+        int sum = 0;
+        for (const QJsonValue& part : answer.json("parts").toArray())
+            sum += part.toObject().value(QLatin1String("after")).toInt();
+        EXPECT_EQ(sum, size);
+        EXPECT_EQ(answer.number("after"), size);
+    }
+    const Answer first = kdd("stat --bytes 1.2 --json");
+    const int listed = first.json("attributes").toArray().size();
+    EXPECT_EQ(listed + first.number("notListed"),
+              kdd("stat --bytes 1.2 --all --json").json("attributes").toArray().size());
+    EXPECT_TRUE(kdd("stat --bytes").out.contains("(0008,0018)  SOPInstanceUID"));
+    for (const char* wrong : {"stat", "stat 1.2 1.3", "stat 1.2 --all"})
+        EXPECT_EQ(kdd(wrong).exitCode, 2) << wrong;
+    EXPECT_EQ(kdd("stat --bytes 9").exitCode, 1);
+}
+
 TEST_F(CommandLine, CountsWhatItCannotTakeAndGoesOn)
 {
     addTwoStudies();

@@ -55,6 +55,18 @@ Result StoredStudy::readStamped(const QString& path, const char* studyUID)
     return result;
 }
 
+Result StoredStudy::readContent(const QString& path, const char* studyUID, QByteArray& content)
+{
+    mIsLockedOut = false;
+    Result result = open(path, false, Reader::Serving);
+    if (result.bad())
+        return result;
+    content = mFile.content();
+    mFile.close();
+    QDataStream in(content);
+    return read(in, studyUID);
+}
+
 Result StoredStudy::readThrough(QIODevice& input, const QString& path, const char* studyUID, bool keepOpen,
                                 Reader reader)
 {

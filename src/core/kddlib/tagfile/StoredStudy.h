@@ -63,6 +63,9 @@ public:
     /// The same for others who wait for it, with the stamp of the bytes that were read.
     Result readStamped(const QString& path, const char* studyUID);
 
+    /// The same with all the bytes of the file, those included that are left over behind what the tree was made of.
+    Result readContent(const QString& path, const char* studyUID, QByteArray& content);
+
     /// Holds the study's file alone and reads it. An absent or empty file holds no study, which is no failure.
     Result hold(const QByteArray& studyUID, IfAbsent ifAbsent);
 
