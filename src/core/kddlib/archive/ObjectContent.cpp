@@ -66,13 +66,6 @@ Result findDataset(const QByteArray& path, qint64& offset)
     return {};
 }
 
-ObjectMeta metaOf(DcmFileFormat& file)
-{
-    DcmMetaInfo& meta = *file.getMetaInfo();
-    return {textOf(meta, DCM_MediaStorageSOPClassUID), textOf(meta, DCM_MediaStorageSOPInstanceUID),
-            textOf(meta, DCM_TransferSyntaxUID)};
-}
-
 Result readMeta(const QByteArray& path, ObjectMeta& meta)
 {
     qint64 offset = 0;
@@ -84,7 +77,9 @@ Result readMeta(const QByteArray& path, ObjectMeta& meta)
         format.loadFile(path.constData(), EXS_Unknown, EGL_noChange, DCM_MaxReadLength, ERM_metaOnly);
     if (read.bad())
         return Result::failure(QString::fromLatin1(read.text()));
-    meta = metaOf(format);
+    DcmMetaInfo& info = *format.getMetaInfo();
+    meta = {textOf(info, DCM_MediaStorageSOPClassUID), textOf(info, DCM_MediaStorageSOPInstanceUID),
+            textOf(info, DCM_TransferSyntaxUID)};
     return {};
 }
 

@@ -4,8 +4,6 @@
 
 #include <QByteArray>
 
-class DcmFileFormat;
-
 namespace Kdd
 {
 
@@ -23,9 +21,6 @@ Result findDataset(const QByteArray& path, qint64& offset);
 
 /// Failure: as above.
 Result readMeta(const QByteArray& path, ObjectMeta& meta);
-
-/// Of a file that was read already, as far as it could be.
-ObjectMeta metaOf(DcmFileFormat& file);
 
 /// Whether two files hold the same object: the same bytes, or the same dataset in the same transfer syntax, for senders
 /// write meta information of their own. False also when one cannot be read.

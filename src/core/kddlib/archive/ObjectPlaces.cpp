@@ -5,7 +5,6 @@
 #include "platform/os/FileStatus.h"
 
 #include <dcmtk/dcmdata/dcdeftag.h>
-#include <dcmtk/dcmdata/dcfilefo.h>
 
 #include <cerrno>
 
@@ -62,15 +61,13 @@ ArrivalFault faultOf(const SystemResult& result)
 
 bool ObjectPlaces::check(DicomInput& input, const QByteArray& studyUID, ArrivedObject& object)
 {
-    qint64 offset = 0;
-    const Result found = findDataset(input.path, offset);
+    ObjectMeta meta;
+    const Result found = readMeta(input.path, meta);
     if (found.bad()) {
         refuse(object, ArrivalFault::NotDicom, found.text());
         return false;
     }
-    DcmFileFormat file;
-    input = readDicomInput(input.path, Damage::Refused, file);
-    const ObjectMeta meta = metaOf(file);
+    input = readDicomInput(input.path, Damage::Refused);
     object.sopClassUID = meta.sopClassUID;
     object.sopInstanceUID = isName(meta.sopInstanceUID) ? meta.sopInstanceUID : QByteArray();
     if (input.kind != DicomInput::Kind::Image) {
