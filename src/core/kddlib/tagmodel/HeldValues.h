@@ -37,7 +37,7 @@ struct TagMap::Held
 };
 
 /// What the children of a node hold themselves, by key. Of those that are encoded it stays valid as long as this.
-class TagMap::HeldValues
+class KDD_LOCAL TagMap::HeldValues
 {
 public:
     struct Entry
