@@ -21,6 +21,14 @@ bool belongsToTerminal()
     return terminal >= 0 && ::sigaction(SIGHUP, nullptr, &action) == 0 && action.sa_handler == SIG_DFL;
 }
 
+/// One that came before was taken note of by the handler that commands have, which lets go of the signal then. It is not
+/// asked whether it did: a module of the tool has no part in that.
+bool cameBefore(int signal)
+{
+    struct sigaction handler = {};
+    return ::sigaction(signal, nullptr, &handler) == 0 && handler.sa_handler == SIG_DFL;
+}
+
 }  // namespace
 
 ServerSignals::ServerSignals()
@@ -31,6 +39,7 @@ ServerSignals::ServerSignals()
     if (!belongsToTerminal())
         sigaddset(&mSignals, SIGHUP);
     ::pthread_sigmask(SIG_BLOCK, &mSignals, &mFormer);
+    mIsOver = cameBefore(SIGINT) || cameBefore(SIGTERM);
 }
 
 ServerSignals::~ServerSignals()
@@ -40,9 +49,11 @@ ServerSignals::~ServerSignals()
 
 void ServerSignals::awaitEnd(const std::function<void()>& renew) const
 {
-    int signal = SIGHUP;
-    for (::sigwait(&mSignals, &signal); signal == SIGHUP; ::sigwait(&mSignals, &signal))
-        renew();
+    for (int signal = mIsOver ? SIGTERM : SIGHUP; signal == SIGHUP;) {
+        ::sigwait(&mSignals, &signal);
+        if (signal == SIGHUP)
+            renew();
+    }
     std::signal(SIGINT, SIG_DFL);
     std::signal(SIGTERM, SIG_DFL);
     ::pthread_sigmask(SIG_UNBLOCK, &mSignals, nullptr);

@@ -17,13 +17,14 @@ public:
     ServerSignals(const ServerSignals&) = delete;
     ServerSignals& operator=(const ServerSignals&) = delete;
 
-    /// Returns with the first one that ends the process; a second one ends it at once. One that asks for something to be
-    /// read anew calls `renew`.
+    /// Returns with the first one that ends the process, at once if it came before this object; a second one ends it at once.
+    /// One that asks for something to be read anew calls `renew`.
     void awaitEnd(const std::function<void()>& renew) const;
 
 private:
     sigset_t mSignals = {};
     sigset_t mFormer = {};
+    bool mIsOver = false;
 };
 
 /// At the start of what runs until it is interrupted: all modules come from the installation that it was started with. One

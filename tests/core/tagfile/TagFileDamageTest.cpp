@@ -173,7 +173,7 @@ private:
         FILE* statm = std::fopen("/proc/self/statm", "r");
         if (statm == nullptr || std::fscanf(statm, "%lu", &pages) != 1)
             ::_exit(100);
-        const rlim_t all = pages * static_cast<rlim_t>(::sysconf(_SC_PAGESIZE)) + (64U << 20U);
+        const rlim_t all = pages * static_cast<rlim_t>(::sysconf(_SC_PAGESIZE)) + (128U << 20U);
         const rlimit limit = {all, all};
         ::setrlimit(RLIMIT_AS, &limit);
         try {
