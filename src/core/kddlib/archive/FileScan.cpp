@@ -7,10 +7,6 @@
 #include "platform/base/LogFile.h"
 #include "platform/os/FileStatus.h"
 
-#include <dcmtk/config/osconfig.h>
-
-#include <dcmtk/dcmdata/dcfilefo.h>
-
 #include <algorithm>
 
 namespace Kdd
@@ -32,10 +28,8 @@ Result FileScan::readAll(const QList<QByteArray>& files, const std::function<Res
         if (mObserver.isCancelled())
             return {};
         DicomInput input;
-        if (!takePlain(files.at(i), ahead.next(), input)) {
-            DcmFileFormat format;
-            input = readDicomInput(files.at(i), mDamage, format);
-        }
+        if (!takePlain(files.at(i), ahead.next(), input))
+            input = parseInput(files.at(i), mDamage);
         Result taken = handOn(std::move(input), take);
         if (taken.bad())
             return taken;
