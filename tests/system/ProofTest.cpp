@@ -1,9 +1,9 @@
 #include "ServedStore.h"
+#include "kddlib/tagfile/TagFile.h"
 
 #include <QThread>
 
 #include <fcntl.h>
-#include <kddlib/TagFile.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -101,7 +101,10 @@ TEST_F(Proof, AServerLooksInTheBackground)
     const QJsonObject told = QJsonDocument::fromJson(server->readLine()).object();
     const QByteArray status = told.value(QLatin1String("status")).toString().toLatin1();
     QByteArray counted;
-    for (int look = 0; look < 3000 && !counted.contains("kdd_check_faulty_studies 1\n"); ++look) {
+    const auto isDone = [&] {
+        return counted.contains("kdd_check_studies 2\n") && counted.contains("kdd_check_faulty_studies 1\n");
+    };
+    for (int look = 0; look < 3000 && !isDone(); ++look) {
         counted = metrics(status);
         QThread::msleep(10);
     }

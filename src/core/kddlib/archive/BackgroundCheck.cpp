@@ -122,15 +122,14 @@ Result BackgroundCheck::Private::step(bool& isIdle)
         catalogue = Kxg::Catalogue::openExisting(Kxg::DatabaseServer(), result);
     if (result.good())
         result = turn == nullptr ? catalogue->takeCheckTurn(turn) : turn->confirm();
-    isIdle = turn == nullptr;
-    if (result.bad() || isIdle)
-        return result;
     Kxg::CheckedStudy study;
-    int faulty = 0;
-    result = catalogue->nextToCheck(QDateTime::currentMSecsSinceEpoch() - pace.again.count(), study);
+    if (result.good() && turn != nullptr)
+        result = catalogue->nextToCheck(QDateTime::currentMSecsSinceEpoch() - pace.again.count(), study);
     isIdle = study.studyInstanceUID.isEmpty();
     if (result.good() && !isIdle)
         result = check(study);
+    // Also where another one is at work, so that it does not matter which server is asked.
+    int faulty = 0;
     if (result.good())
         result = catalogue->countFaulty(faulty);
     const std::lock_guard<std::mutex> lock(mutex);
