@@ -1,5 +1,6 @@
 #include "server/Server.h"
 
+#include "server/DatabaseWitness.h"
 #include "server/DimseService.h"
 #include "server/RequestLog.h"
 #include "server/Resources.h"
@@ -196,6 +197,9 @@ struct Server::Private
         archive.takesByRequest = settings.takesByRequest;
         archive.changes = std::make_unique<DicomWeb::Turns>(settings.changes);
         archive.studies->setArrivals(archive.arrivals.get());
+        if (settings.provesTagFiles)
+            archive.witness = std::make_unique<DatabaseWitness>(archive.database);
+        archive.studies->setWitness(archive.witness.get());
         router.add(prefix, std::make_unique<DicomWeb::DicomWebService>(prefix.size(),
                                                                        makeResources(archive, metrics)));
         router.add(Router::segmentsOf(kUriPath),

@@ -35,6 +35,7 @@ struct ServerSettings
     QByteArray dimseAudit;  ///< as DimseLog has it
     DicomWeb::StoreLimits store;
     DicomWeb::ChangeRules changes;
+    bool provesTagFiles = false;                 ///< against the image database, each time one is read
     std::optional<BackgroundCheck::Pace> check;  ///< of all bytes of the archive; without it there is none
     std::chrono::milliseconds slow{2000};        ///< requests that take longer are told in the log
 };

@@ -18,7 +18,8 @@ class Proof : public ServedStore
 protected:
     void TearDown() override
     {
-        for (const char* name : {"KDD_FILE_DIGESTS", "KDD_CHECK_RATE", "KDD_CHECK_HEALS"})
+        for (const char* name :
+             {"KDD_FILE_DIGESTS", "KDD_CHECK_RATE", "KDD_CHECK_HEALS", "KDD_SERVER_PROVES"})
             qunsetenv(name);
     }
 
@@ -115,6 +116,32 @@ TEST_F(Proof, AServerLooksInTheBackground)
     EXPECT_EQ(answer.exitCode, 0);
     EXPECT_TRUE(answer.err.contains("/images/1 is damaged")) << answer.err.toStdString();
     EXPECT_EQ(kdd("verify --all").exitCode, 0);
+}
+
+TEST_F(Proof, AServerThatProvesServesNoWrongPreview)
+{
+    qputenv("KDD_SERVER_PROVES", "1");
+    save("1", anImage("1").inStudy("1.2"));
+    addImages();
+    Addresses addresses;
+    const auto server = serve(addresses);
+    const auto status = [&] {
+        Client client(addresses.http);
+        client.get("/dicom-web/studies/1.2/metadata");
+        return client.reply().status;
+    };
+    EXPECT_EQ(status(), 200);
+    // Stored without a checksum, as previews are: only the digest tells.
+    EXPECT_EQ(kdd("--compression none build --all --again").exitCode, 0);
+    EXPECT_EQ(status(), 200);
+    const qint64 name = fileContent(tagFile("1.2")).indexOf("1.2.840.10008.");
+    ASSERT_GT(name, 0);
+    flip(tagFile("1.2"), name);
+    EXPECT_EQ(status(), 500);
+    EXPECT_EQ(kdd("verify --all --heal --json").number("healed"), 1);
+    EXPECT_EQ(status(), 200);
+    server->terminate();
+    EXPECT_TRUE(finish(*server).err.contains("is damaged and not served"));
 }
 
 TEST_F(Proof, ObjectsThatArriveAreDigestedAsTheyPass)

@@ -55,6 +55,7 @@ constexpr Setting kCheckHeals = {"KDD_CHECK_HEALS", "archive/checkheals", "0"};
 constexpr Setting kServerCorrections = {"KDD_SERVER_CORRECTIONS", "server/corrections", "0"};
 constexpr Setting kServerDeletions = {"KDD_SERVER_DELETIONS", "server/deletions", "0"};
 constexpr Setting kServerStow = {"KDD_SERVER_STOW", "server/stow", "0"};
+constexpr Setting kServerProves = {"KDD_SERVER_PROVES", "server/proves", "0"};
 constexpr Setting kServerRequestSize = {"KDD_SERVER_REQUEST_SIZE", "server/requestsize", "65536"};
 constexpr Setting kServerListen = {"KDD_SERVER_LISTEN", "server/listen", "127.0.0.1:8042"};
 constexpr Setting kServerStatus = {"KDD_SERVER_STATUS", "server/status", ""};
@@ -290,6 +291,11 @@ bool ExResource::serverTakesCorrections()
 bool ExResource::serverDeletes()
 {
     return valueOf(kServerDeletions) == "1";
+}
+
+bool ExResource::serverProvesTagFiles()
+{
+    return valueOf(kServerProves) == "1";
 }
 
 int ExResource::serverRequestSize()

@@ -120,6 +120,10 @@ public:
     static bool serverTakesCorrections();
     static bool serverDeletes();
 
+    /// Whether it holds each tag file that it reads against the image database, and serves none that is damaged: only when
+    /// the value is 1. KDD_SERVER_PROVES, server/proves, "0".
+    static bool serverProvesTagFiles();
+
     /// How large a request with objects may be [MiB], 1 to 16,777,216. KDD_SERVER_REQUEST_SIZE, server/requestsize, "65536".
     static int serverRequestSize();
 

@@ -113,6 +113,7 @@ bool readSettings(const GlobalOptions& options, const ServeRequest& request, Ser
     settings.viewer =
         request.viewer.isEmpty() ? QFile::decodeName(ExResource::serverViewer()) : request.viewer;
     settings.check = checkPace();
+    settings.provesTagFiles = ExResource::serverProvesTagFiles();
     settings.slow = std::chrono::milliseconds(ExResource::serverSlow());
     settings.addresses.publicAddress = orElse(request.publicAddress, ExResource::serverPublicAddress());
     settings.addresses.hosts = wordsOf(ExResource::serverHosts()) + request.hosts.toVector();
