@@ -6,6 +6,7 @@ set(KDD_PUBLIC_HEADERS
   core/kddlib/archive/ArchiveDatabase.h
   core/kddlib/archive/ArchiveRestoration.h
   core/kddlib/archive/ArrivedStudies.h
+  core/kddlib/archive/BackgroundCheck.h
   core/kddlib/archive/CorrectedDataset.h
   core/kddlib/archive/DicomInput.h
   core/kddlib/archive/FileScan.h
@@ -19,6 +20,7 @@ set(KDD_PUBLIC_HEADERS
   core/kddlib/archive/StudyCompletion.h
   core/kddlib/archive/StudyIndexing.h
   core/kddlib/archive/StudyIntake.h
+  core/kddlib/archive/StudyProof.h
   core/kddlib/archive/StudyStacker.h
   core/kddlib/archive/StudyWorkers.h
   core/kddlib/archive/WorkObserver.h
@@ -93,6 +95,7 @@ set(KDD_PUBLIC_HEADERS
   platform/database/SearchText.h
   platform/database/StorageManager.h
   platform/database/StudyLimits.h
+  platform/database/StudyProofs.h
   platform/database/StudySearch.h
   platform/database/TagFileStamp.h
   platform/filecache/ExFileCache.h

@@ -24,6 +24,7 @@ struct ServedArchive
     std::shared_ptr<DicomWeb::ObjectShelf> objects = std::make_shared<DicomWeb::ObjectShelf>(32 << 20);
     DicomWeb::ThreadSearch database{Kxg::DatabaseServer()};
     DicomWeb::StudySight sight{database, *studies};
+    std::unique_ptr<DicomWeb::TagFileWitness> witness;   ///< null where tag files are believed
     std::unique_ptr<DicomWeb::ArrivalService> arrivals;  ///< null where no objects are taken
     bool takesByRequest = true;                          ///< and not by associations alone
     DicomWeb::StoreLimits storeLimits;

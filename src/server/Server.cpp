@@ -1,5 +1,6 @@
 #include "server/Server.h"
 
+#include "server/DatabaseWitness.h"
 #include "server/DimseService.h"
 #include "server/RequestLog.h"
 #include "server/Resources.h"
@@ -196,6 +197,9 @@ struct Server::Private
         archive.takesByRequest = settings.takesByRequest;
         archive.changes = std::make_unique<DicomWeb::Turns>(settings.changes);
         archive.studies->setArrivals(archive.arrivals.get());
+        if (settings.provesTagFiles)
+            archive.witness = std::make_unique<DatabaseWitness>(archive.database);
+        archive.studies->setWitness(archive.witness.get());
         router.add(prefix, std::make_unique<DicomWeb::DicomWebService>(prefix.size(),
                                                                        makeResources(archive, metrics)));
         router.add(Router::segmentsOf(kUriPath),
@@ -209,10 +213,29 @@ struct Server::Private
         router.add({}, std::make_unique<Browser::BrowserService>(*archive.studies, browser));
         if (settings.status)
             status = std::make_unique<Http::HttpServer>(statusSettings(settings), statusGuard, unobserved);
+        if (settings.check)
+            addCheck(*settings.check);
         metrics.addGauge("kdd_http_connections", "Connections that are open.",
                          [this] { return http.connections(); });
         metrics.addGauge("kdd_http_requests_in_flight", "Requests whose answers are not sent whole.",
                          [this] { return http.requestsInFlight(); });
+    }
+
+    void addCheck(const BackgroundCheck::Pace& pace)
+    {
+        check = std::make_unique<BackgroundCheck>(pace);
+        const auto add = [this](const char* name, const char* help, auto value) {
+            metrics.addGauge(name, help,
+                             [this, value] { return static_cast<qint64>(check->counts().*value); });
+        };
+        using Counts = BackgroundCheck::Counts;
+        add("kdd_check_studies", "Studies whose files were looked at, since the beginning.",
+            &Counts::studies);
+        add("kdd_check_bytes", "Bytes of theirs that were read, since the beginning.", &Counts::bytes);
+        add("kdd_check_faults", "Files that were not as they should be, since the beginning.",
+            &Counts::faults);
+        add("kdd_check_healed", "Of these, tag files that were built anew.", &Counts::healed);
+        add("kdd_check_faulty_studies", "Studies with such files that are not healed.", &Counts::faulty);
     }
 
     QVector<QByteArray> prefix;
@@ -231,6 +254,7 @@ struct Server::Private
     Access::AddressGuard statusGuard;
     Http::HttpServer http;
     std::unique_ptr<DimseService> dimse;
+    std::unique_ptr<BackgroundCheck> check;
     std::unique_ptr<Http::HttpServer> status;  // the first to go: it asks all the others
 };
 
@@ -293,6 +317,8 @@ Result Server::start()
         stop();
     else if (d->archive.arrivals != nullptr)
         d->archive.arrivals->start();
+    if (result.good() && d->check != nullptr)
+        d->check->start();
     return result;
 }
 
@@ -315,6 +341,8 @@ void Server::stop()
         d->dimse->stop();
     if (d->archive.arrivals != nullptr)
         d->archive.arrivals->stop(d->stopTime);
+    if (d->check != nullptr)
+        d->check->stop();
     if (d->status != nullptr)
         d->status->stop();
 }

@@ -9,6 +9,7 @@
 
 #include <QString>
 
+#include <kddlib/BackgroundCheck.h>
 #include <kddlib/Result.h>
 
 #include <memory>
@@ -34,7 +35,9 @@ struct ServerSettings
     QByteArray dimseAudit;  ///< as DimseLog has it
     DicomWeb::StoreLimits store;
     DicomWeb::ChangeRules changes;
-    std::chrono::milliseconds slow{2000};  ///< requests that take longer are told in the log
+    bool provesTagFiles = false;                 ///< against the image database, each time one is read
+    std::optional<BackgroundCheck::Pace> check;  ///< of all bytes of the archive; without it there is none
+    std::chrono::milliseconds slow{2000};        ///< requests that take longer are told in the log
 };
 
 /// What `kdd serve` runs: DICOMweb over the archive that the process's settings name. Used by one thread.

@@ -18,6 +18,11 @@
 namespace Kxg
 {
 
+struct CheckedStudy;
+struct FileDigest;
+class CheckTurn;
+struct TagFileProofs;
+
 /// Longer ones are refused [bytes]. PostgreSQL indexes keys up to some 2,700 bytes; held for both engines, so that a
 /// site can change to the other one.
 constexpr int kMaxPath = 2600;
@@ -370,6 +375,38 @@ public:
 
     /// Takes out of `paths` what is known, and what was removed and not registered again.
     virtual Kdd::Result dropKnown(QSet<QByteArray>& paths) = 0;
+
+    /// Leaves a request for a study of which nothing changed, before its tag file is written all the same: whatever dies
+    /// between that and the database leaves a study that waits.
+    virtual Kdd::Result requestRewrite(const QByteArray& studyUID, qint64& request) = 0;
+
+    // ---- what files are known by; StudyProofs.h
+
+    /// All by which the tag file of a study is proven; nothing of one that does not exist.
+    virtual Kdd::Result tagFileProofs(const QByteArray& studyUID, TagFileProofs& proofs) = 0;
+
+    /// The DICOM and volume files of a study, by path, those included that are not shown.
+    virtual Kdd::Result fileDigests(const QByteArray& studyUID, std::vector<FileDigest>& files) = 0;
+
+    /// One file; without a path when it is not registered.
+    virtual Kdd::Result fileDigest(const QByteArray& path, FileDigest& file) = 0;
+
+    /// Keeps digests of files that are registered with the same size and time; of any other file nothing is kept.
+    virtual Kdd::Result recordDigests(const std::vector<FileDigest>& digests) = 0;
+
+    /// The study whose files were looked at the longest ago, of those before `before` [ms since the epoch]. No UID: there
+    /// is none.
+    virtual Kdd::Result nextToCheck(qint64 before, CheckedStudy& study) = 0;
+
+    /// Keeps how far the look at a study has come; with `isDone` it is at its end at this moment.
+    virtual Kdd::Result noteCheck(const CheckedStudy& study, bool isDone) = 0;
+
+    /// Studies in whose files the last look found faults.
+    virtual Kdd::Result countFaulty(int& studies) = 0;
+
+    /// The right to look at the files of the archive in the background, which one process has at a time. Null in `turn`
+    /// when another one has it.
+    virtual Kdd::Result takeCheckTurn(std::unique_ptr<CheckTurn>& turn) = 0;
 
 protected:
     Catalogue() = default;

@@ -163,7 +163,8 @@ void FileRegistration::write(const std::vector<Entry>& entries)
             " ON CONFLICT (path) DO UPDATE SET size = excluded.size, modified = excluded.modified,"
             " kind = excluded.kind, series_id = excluded.series_id, sop_uid = excluded.sop_uid,"
             " registered = excluded.registered, is_shown = excluded.is_shown,"
-            " is_damaged = excluded.is_damaged, correction_id = excluded.correction_id",
+            // It was of the bytes that were there before.
+            " is_damaged = excluded.is_damaged, correction_id = excluded.correction_id, digest = NULL",
         values);
 }
 

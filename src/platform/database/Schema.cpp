@@ -198,6 +198,22 @@ const QStringList kSteps[] = {
         QStringLiteral("CREATE INDEX study_modality_by_date ON study_modality"
                        " (modality, study_date DESC, study_time DESC, uid{also}study_id, name_words, marks)"),
     },
+    {
+        // SHA-256 of all bytes of the file, of the size and time that stand beside it; null: not taken.
+        QStringLiteral("ALTER TABLE file ADD COLUMN digest {bytes}"),
+        // Tag files that were written before the last one, so that one that comes back is known as old.
+        QStringLiteral("CREATE TABLE former_tag_file (id {id}, study_id BIGINT NOT NULL"
+                       " REFERENCES study (id) ON DELETE CASCADE, size BIGINT NOT NULL,"
+                       " digest {bytes} NOT NULL)"),
+        QStringLiteral("CREATE INDEX former_tag_file_of_study ON former_tag_file (study_id, id)"),
+        // When all bytes of the study's files were looked at last [ms since 1970], how many of these files were not as
+        // they should be, and up to which file the look that is not at its end has come.
+        QStringLiteral("ALTER TABLE study ADD COLUMN checked BIGINT NOT NULL DEFAULT 0"),
+        QStringLiteral("ALTER TABLE study ADD COLUMN check_faults BIGINT NOT NULL DEFAULT 0"),
+        QStringLiteral("ALTER TABLE study ADD COLUMN check_position {bytes}"),
+        QStringLiteral("CREATE INDEX study_by_check ON study (checked, id)"),
+        QStringLiteral("CREATE INDEX study_with_faults ON study (check_faults) WHERE check_faults > 0"),
+    },
 };
 
 QString firstRow(SqlConnection& connection, const QString& question)

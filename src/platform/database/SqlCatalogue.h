@@ -46,6 +46,16 @@ public:
     Kdd::Result imageFiles(const QByteArray& studyUID, const QByteArray& sopUID,
                            QVector<KeptFile>& files) override;
 
+    Kdd::Result requestRewrite(const QByteArray& studyUID, qint64& request) override;
+    Kdd::Result tagFileProofs(const QByteArray& studyUID, TagFileProofs& proofs) override;
+    Kdd::Result fileDigests(const QByteArray& studyUID, std::vector<FileDigest>& files) override;
+    Kdd::Result fileDigest(const QByteArray& path, FileDigest& file) override;
+    Kdd::Result recordDigests(const std::vector<FileDigest>& digests) override;
+    Kdd::Result nextToCheck(qint64 before, CheckedStudy& study) override;
+    Kdd::Result noteCheck(const CheckedStudy& study, bool isDone) override;
+    Kdd::Result countFaulty(int& studies) override;
+    Kdd::Result takeCheckTurn(std::unique_ptr<CheckTurn>& turn) override;
+
 private:
     using Access = SqlConnection::Access;
 

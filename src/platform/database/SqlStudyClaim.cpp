@@ -1,4 +1,5 @@
 #include "platform/database/ChangeLog.h"
+#include "platform/database/ProofRows.h"
 #include "platform/database/SearchRows.h"
 #include "platform/database/SqlCatalogue.h"
 #include "platform/database/StudyContent.h"
@@ -122,6 +123,7 @@ public:
             removeSearchRows(mConnection, mStudyId);
             putRegisteredRows(mConnection, mStudyId);
             // Also for a study that stays because it got files meanwhile: it has no tag file now.
+            keepFormerTagFile(mConnection, mStudyId, {});
             mConnection.change("UPDATE study SET tag_file_size = 0, tag_file_digest = NULL WHERE id = ?",
                                {mStudyId});
             // Requests that are still there came after those that are done, and speak of files.
@@ -150,6 +152,7 @@ private:
     void keep(const BuiltStudy& built)
     {
         keepSearch(built);
+        keepFormerTagFile(mConnection, mStudyId, built.tagFile);
         mConnection.change("UPDATE study SET tag_file_size = ?, tag_file_digest = ? WHERE id = ?",
                            {built.tagFile.size, bytesValue(built.tagFile.digest), mStudyId});
         describe(built.series);

@@ -48,9 +48,14 @@ constexpr Setting kObjectsFolder = {"KDD_OBJECTS", "folders/objects", ""};
 constexpr Setting kSameUid = {"KDD_SAME_UID", "archive/sameuid", "refuse"};
 constexpr Setting kFreeSpace = {"KDD_FREE_SPACE", "archive/freespace", "1024"};
 constexpr Setting kObjectSize = {"KDD_OBJECT_SIZE", "archive/objectsize", "4096"};
+constexpr Setting kFileDigests = {"KDD_FILE_DIGESTS", "archive/filedigests", "0"};
+constexpr Setting kCheckRate = {"KDD_CHECK_RATE", "archive/checkrate", "0"};
+constexpr Setting kCheckHours = {"KDD_CHECK_HOURS", "archive/checkhours", "168"};
+constexpr Setting kCheckHeals = {"KDD_CHECK_HEALS", "archive/checkheals", "0"};
 constexpr Setting kServerCorrections = {"KDD_SERVER_CORRECTIONS", "server/corrections", "0"};
 constexpr Setting kServerDeletions = {"KDD_SERVER_DELETIONS", "server/deletions", "0"};
 constexpr Setting kServerStow = {"KDD_SERVER_STOW", "server/stow", "0"};
+constexpr Setting kServerProves = {"KDD_SERVER_PROVES", "server/proves", "0"};
 constexpr Setting kServerRequestSize = {"KDD_SERVER_REQUEST_SIZE", "server/requestsize", "65536"};
 constexpr Setting kServerListen = {"KDD_SERVER_LISTEN", "server/listen", "127.0.0.1:8042"};
 constexpr Setting kServerStatus = {"KDD_SERVER_STATUS", "server/status", ""};
@@ -252,6 +257,27 @@ int ExResource::objectSize()
     return numberOf(kObjectSize, 1, 1024 * 1024);
 }
 
+bool ExResource::takesFileDigests()
+{
+    return valueOf(kFileDigests) == "1";
+}
+
+int ExResource::checkRate()
+{
+    return numberOf(kCheckRate, 0, 100'000);
+}
+
+int ExResource::checkHours()
+{
+    // Ten years.
+    return numberOf(kCheckHours, 0, 87'600);
+}
+
+bool ExResource::checkHeals()
+{
+    return valueOf(kCheckHeals) == "1";
+}
+
 bool ExResource::serverTakesObjects()
 {
     return valueOf(kServerStow) == "1";
@@ -265,6 +291,11 @@ bool ExResource::serverTakesCorrections()
 bool ExResource::serverDeletes()
 {
     return valueOf(kServerDeletions) == "1";
+}
+
+bool ExResource::serverProvesTagFiles()
+{
+    return valueOf(kServerProves) == "1";
 }
 
 int ExResource::serverRequestSize()

@@ -94,6 +94,22 @@ public:
     /// How large one may be [MiB], 1 to 1,048,576. KDD_OBJECT_SIZE, archive/objectsize, "4096".
     static int objectSize();
 
+    /// Whether whoever registers a file keeps a digest of all its bytes: only when the value is 1. KDD_FILE_DIGESTS,
+    /// archive/filedigests, "0".
+    static bool takesFileDigests();
+
+    // The look at all bytes of the archive in the background of `kdd serve`.
+
+    /// How much it reads [MiB/s], up to 100,000; 0: there is none. KDD_CHECK_RATE, archive/checkrate, "0".
+    static int checkRate();
+
+    /// How long after a look at it a study is looked at again [h], up to 87,600. KDD_CHECK_HOURS, archive/checkhours, "168".
+    static int checkHours();
+
+    /// Whether tag files that are not those written last are built anew: only when the value is 1. KDD_CHECK_HEALS,
+    /// archive/checkheals, "0".
+    static bool checkHeals();
+
     // What `kdd serve` does when its options do not say it.
 
     /// Whether it takes objects: only when the value is 1. KDD_SERVER_STOW, server/stow, "0".
@@ -103,6 +119,10 @@ public:
     /// server/corrections, "0"; KDD_SERVER_DELETIONS, server/deletions, "0".
     static bool serverTakesCorrections();
     static bool serverDeletes();
+
+    /// Whether it holds each tag file that it reads against the image database, and serves none that is damaged: only when
+    /// the value is 1. KDD_SERVER_PROVES, server/proves, "0".
+    static bool serverProvesTagFiles();
 
     /// How large a request with objects may be [MiB], 1 to 16,777,216. KDD_SERVER_REQUEST_SIZE, server/requestsize, "65536".
     static int serverRequestSize();

@@ -110,6 +110,7 @@ struct StudyShelf::Private
                   std::shared_ptr<const ServedStudy>& study);
 
     Http::CacheCount count;
+    TagFileWitness* witness = nullptr;
 
     std::mutex mutex;
     QHash<QByteArray, std::shared_ptr<Entry>> entries;
@@ -211,6 +212,16 @@ void StudyShelf::Private::read(Entry& entry, const QByteArray& uid, const QStrin
     if (before.isAbsent()) {
         entry.presence = Presence::Absent;
     } else if (file->readStampedWhenFree(path, uid.constData())) {
+        Kxg::TagFileStamp stamp = file->stamp();
+        stamp.fileSize = before.size;
+        stamp.modified = before.modified;
+        // Looked at again by whoever asks next: it may have been written in the same tick as the one before.
+        if (witness != nullptr && before.equals(stateOf(name)) && witness->isDamaged(uid, stamp)) {
+            entry.presence = Presence::Damaged;
+            entry.version.clear();
+            put(entry, nullptr, 0);
+            return;
+        }
         const QByteArray version = file->stamp().digest.toHex();
         entry.state = before.equals(stateOf(name)) ? before : FileState();
         entry.presence = Presence::Found;
@@ -271,6 +282,11 @@ StudyShelf::StudyShelf(qint64 capacity, std::chrono::nanoseconds settledAge)
 }
 
 StudyShelf::~StudyShelf() = default;
+
+void StudyShelf::setWitness(TagFileWitness* witness)
+{
+    d->witness = witness;
+}
 
 Presence StudyShelf::find(const QByteArray& studyUID, std::shared_ptr<const ServedStudy>& study)
 {

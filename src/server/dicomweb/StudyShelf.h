@@ -5,6 +5,7 @@
 #include <QByteArray>
 
 #include <kddlib/TagFile.h>
+#include <kddlib/TagFileStamp.h>
 
 #include <chrono>
 #include <memory>
@@ -70,6 +71,17 @@ public:
     virtual void bringInOwn(const QByteArray& studyUID) = 0;
 };
 
+/// Knows by what a tag file was recognised when it was written. Called on several threads at the same time.
+class TagFileWitness
+{
+public:
+    virtual ~TagFileWitness() = default;
+
+    /// Whether the bytes that were read are others than those that were written, though the size and time of the file are
+    /// as they were then: told in the log.
+    virtual bool isDamaged(const QByteArray& studyUID, const Kxg::TagFileStamp& read) = 0;
+};
+
 /// The tag files that were asked for last, read again as soon as they change. May be used on any thread.
 class StudyShelf
 {
@@ -84,6 +96,9 @@ public:
     /// Who knows of images that tag files do not show yet; null: nobody. Set before it is used, and outlives it.
     void setArrivals(Arrivals* arrivals) { mArrivals = arrivals; }
     Arrivals* arrivals() const { return mArrivals; }
+
+    /// Who is asked of each tag file that is read; null: nobody. Likewise.
+    void setWitness(TagFileWitness* witness);
 
     /// The study as its file is now.
     Presence find(const QByteArray& studyUID, std::shared_ptr<const ServedStudy>& study);

@@ -70,7 +70,7 @@ TEST_P(DatabaseFailureTest, TablesThatAreMissingOrOfANewerProgramAreRefused)
     EXPECT_EQ(GetGlobalConfig("Storage", "MetaFolder", "/fallback"), "/fallback");
     catalogue();
     execute("UPDATE schema_version SET version = 99");
-    const std::string newer = ": its tables have version 99, this program works with version 8";
+    const std::string newer = ": its tables have version 99, this program works with version 9";
     for (const std::string& text : {opening(address()), asking()})
         EXPECT_NE(text.find(newer), std::string::npos) << text;
 }

@@ -7,6 +7,7 @@
 #include "kddlib/tagfile/TagFile.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
+#include "platform/database/StudyProofs.h"
 
 #include <algorithm>
 #include <condition_variable>
@@ -45,6 +46,7 @@ struct PendingStudy
 struct Queued
 {
     std::vector<DicomInput> images;
+    QHash<QByteArray, QByteArray> digests;
     Result result;
     QSet<QByteArray> corrected;
     bool isDone = false;
@@ -55,6 +57,8 @@ struct Queued
 struct ArrivedStudies::Private
 {
     Result registerQueued(Kxg::Catalogue& catalogue);
+    void keepDigests(const Queued& registered);
+    void recordDigests(Kxg::Catalogue& catalogue);
     void keep(DicomInput& image, const Registration& registration);
     PendingStudy& obtain(const QByteArray& studyUID);
     std::unique_ptr<PendingStudy> take(const QByteArray& studyUID);
@@ -71,6 +75,7 @@ struct ArrivedStudies::Private
     mutable std::mutex mutex;  // of all below; taken after the other one
     std::condition_variable changed;
     std::vector<Queued*> queued;
+    std::vector<Kxg::FileDigest> digested;  // of registered files, and not kept yet
     std::map<QByteArray, std::unique_ptr<PendingStudy>> pending;
     QSet<QByteArray> running;
     QHash<QByteArray, int> failures;
@@ -112,6 +117,31 @@ void ArrivedStudies::Private::keep(DicomInput& image, const Registration& regist
     }
 }
 
+void ArrivedStudies::Private::keepDigests(const Queued& registered)
+{
+    for (const DicomInput& image : registered.images) {
+        const auto digest = registered.digests.constFind(image.path);
+        if (digest != registered.digests.cend())
+            digested.push_back({image.path, image.stamp, *digest, false});
+    }
+}
+
+/// What dies before leaves files without a digest, which is told and can be mended.
+void ArrivedStudies::Private::recordDigests(Kxg::Catalogue& catalogue)
+{
+    std::vector<Kxg::FileDigest> taken;
+    {
+        const std::lock_guard<std::mutex> lock(mutex);
+        taken.swap(digested);
+    }
+    if (taken.empty())
+        return;
+    const Result result = catalogue.recordDigests(taken);
+    if (result.bad())
+        LogFile::warnf("%d files that arrived go without a digest: %s", static_cast<int>(taken.size()),
+                       qUtf8Printable(result.text()));
+}
+
 /// All that wait, by whichever of their threads comes first.
 Result ArrivedStudies::Private::registerQueued(Kxg::Catalogue& catalogue)
 {
@@ -127,12 +157,14 @@ Result ArrivedStudies::Private::registerQueued(Kxg::Catalogue& catalogue)
             result = result.good() ? registration.add(image) : result;
     }
     if (result.good())
-        result = registration.flush();
+        result = registration.flushUndigested();
     const std::lock_guard<std::mutex> lock(mutex);
     const std::size_t before = pending.size();
     for (const QByteArray& studyUID : registration.studies())
         obtain(studyUID);
     for (Queued* each : taken) {
+        if (result.good())
+            keepDigests(*each);
         for (DicomInput& image : each->images) {
             if (result.good())
                 keep(image, registration);
@@ -163,8 +195,15 @@ ArrivedStudies::~ArrivedStudies() = default;
 Result ArrivedStudies::add(std::vector<DicomInput> images, Kxg::Catalogue& catalogue,
                            QSet<QByteArray>& corrected)
 {
+    return add(std::move(images), {}, catalogue, corrected);
+}
+
+Result ArrivedStudies::add(std::vector<DicomInput> images, const QHash<QByteArray, QByteArray>& digests,
+                           Kxg::Catalogue& catalogue, QSet<QByteArray>& corrected)
+{
     Queued entry;
     entry.images = std::move(images);
+    entry.digests = digests;
     {
         const std::lock_guard<std::mutex> lock(d->mutex);
         d->queued.push_back(&entry);
@@ -304,6 +343,7 @@ void ArrivedStudies::Private::conclude(const QByteArray& studyUID, bool isDone, 
 
 Result ArrivedStudies::complete(const QByteArray& studyUID, Kxg::Catalogue& catalogue, int patienceMs)
 {
+    d->recordDigests(catalogue);
     {
         std::unique_lock<std::mutex> lock(d->mutex);
         const bool isFree = d->changed.wait_for(lock, std::chrono::milliseconds(patienceMs),

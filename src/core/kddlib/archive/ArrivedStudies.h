@@ -5,6 +5,7 @@
 #include "platform/base/Result.h"
 
 #include <QByteArray>
+#include <QHash>
 #include <QList>
 #include <QSet>
 
@@ -45,6 +46,11 @@ public:
     /// Registers images. Success: they are registered for good, and `corrected` has the paths of those that a correction
     /// shows as something else than they say; perhaps with others that were registered at the same time.
     Result add(std::vector<DicomInput> images, Kxg::Catalogue& catalogue, QSet<QByteArray>& corrected);
+
+    /// The same with digests of all bytes of the files, by their paths, where they are known. They are kept with the next
+    /// study that is completed, so that nobody who sent an image waits for them.
+    Result add(std::vector<DicomInput> images, const QHash<QByteArray, QByteArray>& digests,
+               Kxg::Catalogue& catalogue, QSet<QByteArray>& corrected);
 
     /// Of a study that waits for a reason that is not known here; it is due at once.
     void addWaiting(const QByteArray& studyUID);

@@ -24,11 +24,12 @@ ObjectBatch::ObjectBatch(const ObjectPlaces& places, ArrivedStudies& studies, Fl
 {
 }
 
-void ObjectBatch::add(StagedFile& file, ArrivalFault fault, const QString& reason)
+void ObjectBatch::add(StagedFile& file, const QByteArray& digest, ArrivalFault fault, const QString& reason)
 {
     mEntries.emplace_back();
     Entry& entry = mEntries.back();
     entry.file = &file;
+    entry.digest = digest;
     entry.input.path = file.path();
     if (fault != ArrivalFault::None) {
         refuse(entry.object, fault, reason);
@@ -71,11 +72,16 @@ bool ObjectBatch::lock(Entry& entry)
     return locked.good();
 }
 
+/// Whether the object's place leads to the file that was received, and not to one that lay there already.
+bool ObjectBatch::isOwn(const Entry& entry)
+{
+    return isSameFile(entry.file->path(), entry.input.path);
+}
+
 /// Of a file that lay there already nobody knows whether it ever was waited for.
 SystemResult ObjectBatch::flush(const Entry& entry)
 {
-    const bool isOwn = isSameFile(entry.file->path(), entry.input.path);
-    return isOwn ? entry.file->flush() : flushFile(entry.input.path);
+    return isOwn(entry) ? entry.file->flush() : flushFile(entry.input.path);
 }
 
 std::vector<ArrivedObject> ObjectBatch::finish()
@@ -106,7 +112,7 @@ Result ObjectBatch::awaitFlushes()
         const SystemResult flushed = entry->flushed.valid() ? entry->flushed.get() : last;
         if (flushed.good())
             return true;
-        if (isSameFile(entry->file->path(), entry->input.path))
+        if (isOwn(*entry))
             ::unlink(entry->input.path.constData());
         refuse(entry->object, faultOf(flushed), flushed.text());
         return false;
@@ -140,13 +146,16 @@ void ObjectBatch::registerPlaced(Result result)
 {
     std::vector<DicomInput> images;
     std::vector<QByteArray> paths;
+    QHash<QByteArray, QByteArray> digests;
     for (Entry* entry : mPlaced) {
+        if (!entry->digest.isEmpty() && isOwn(*entry))
+            digests.insert(entry->input.path, entry->digest);
         paths.push_back(entry->input.path);
         images.push_back(std::move(entry->input));
     }
     QSet<QByteArray> corrected;
     if (result.good() && !images.empty())
-        result = mStudies.add(std::move(images), mCatalogue, corrected);
+        result = mStudies.add(std::move(images), digests, mCatalogue, corrected);
     for (std::size_t i = 0; i < mPlaced.size(); ++i) {
         ArrivedObject& object = mPlaced[i]->object;
         if (result.good()) {

@@ -25,8 +25,8 @@ public:
                 Kxg::Catalogue& catalogue, QByteArray studyUID, Admission admits);
 
     /// Reads and checks one that was received, or refused by then, gives it its place and begins to wait for the disk. The
-    /// file outlives the object.
-    void add(StagedFile& file, ArrivalFault fault, const QString& reason);
+    /// file outlives the object. `digest` is of what was received; empty: none was taken.
+    void add(StagedFile& file, const QByteArray& digest, ArrivalFault fault, const QString& reason);
 
     /// Registers all, and tells of each in the order in which they came.
     std::vector<ArrivedObject> finish();
@@ -37,11 +37,13 @@ private:
         StagedFile* file = nullptr;
         DicomInput input;
         ArrivedObject object;
+        QByteArray digest;
         std::future<SystemResult> flushed;
     };
 
     bool check(Entry& entry) const;
     bool lock(Entry& entry);
+    static bool isOwn(const Entry& entry);
     static SystemResult flush(const Entry& entry);
     void settle();
     Result awaitFlushes();

@@ -1,6 +1,7 @@
 #include "kddlib/archive/ObjectStore.h"
 
 #include "kddlib/archive/ArrivedStudies.h"
+#include "kddlib/archive/ContentDigest.h"
 #include "kddlib/archive/DicomInput.h"
 #include "kddlib/archive/FileWalk.h"
 #include "kddlib/archive/ObjectBatch.h"
@@ -11,6 +12,7 @@
 #include "platform/os/NamedLocks.h"
 #include "platform/os/PathName.h"
 #include "platform/os/StagedFile.h"
+#include "platform/resources/ExResource.h"
 
 #include <QDir>
 #include <QUuid>
@@ -46,6 +48,7 @@ struct ObjectArrival::Private
     qint64 roomSeen = 0;  // up to which size the disk was found to have room
     ArrivalFault fault = ArrivalFault::None;
     QString reason;
+    std::unique_ptr<ContentDigest> digest;  // null where the site wants none
 
     bool refuse(ArrivalFault what, const QString& why)
     {
@@ -79,6 +82,8 @@ bool ObjectArrival::take(const char* bytes, qint64 count)
         d->roomSeen = d->file.size() + kRoomStep;
     }
     const SystemResult written = d->file.append(bytes, count);
+    if (d->digest != nullptr)
+        d->digest->add(bytes, count);
     return written.good() || d->refuse(faultOf(written), written.text());
 }
 
@@ -106,6 +111,7 @@ struct ObjectStore::Private
     ArrivedStudies& studies;
     const ObjectRules rules;
     const ObjectPlaces places;
+    const bool takesDigests = ExResource::takesFileDigests();
     QByteArray staging;  // of this process alone
     LockFile life;       // by which others know that it still lives
     std::atomic<quint64> count{0};
@@ -171,6 +177,8 @@ std::unique_ptr<ObjectArrival> ObjectStore::begin()
     const SystemResult created = made->file.create(d->staging + '/' + QByteArray::number(++d->count));
     if (created.bad())
         made->refuse(faultOf(created), created.text());
+    if (d->takesDigests)
+        made->digest = std::make_unique<ContentDigest>();
     return std::unique_ptr<ObjectArrival>(new ObjectArrival(std::move(made)));
 }
 
@@ -180,7 +188,8 @@ std::vector<ArrivedObject> ObjectStore::commit(std::vector<std::unique_ptr<Objec
 {
     ObjectBatch batch(d->places, d->studies, d->flushes, catalogue, studyUID, admits);
     for (const auto& arrival : arrivals)
-        batch.add(arrival->d->file, arrival->d->fault, arrival->d->reason);
+        batch.add(arrival->d->file, arrival->d->digest ? arrival->d->digest->result() : QByteArray(),
+                  arrival->d->fault, arrival->d->reason);
     return batch.finish();
 }
 
@@ -255,7 +264,9 @@ Result ObjectStore::Private::takeIn(const QByteArray& place, Kxg::Catalogue& cat
     LogFile::warnf("%s was stored by a server that ended before it told so; it is taken in now",
                    place.constData());
     QSet<QByteArray> corrected;
-    return studies.add(std::move(images), catalogue, corrected);
+    const Kxg::FileDigest taken{place, images[0].stamp, {}, false};
+    result = studies.add(std::move(images), catalogue, corrected);
+    return result.good() && takesDigests ? digestRegistered(catalogue, {taken}) : result;
 }
 
 }  // namespace Kdd

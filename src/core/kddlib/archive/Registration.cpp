@@ -1,9 +1,11 @@
 #include "kddlib/archive/Registration.h"
 
+#include "kddlib/archive/ContentDigest.h"
 #include "kddlib/archive/DicomInput.h"
 #include "kddlib/tagfile/StudyRecord.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
+#include "platform/resources/ExResource.h"
 
 namespace Kdd
 {
@@ -58,6 +60,27 @@ Result Registration::add(const DicomInput& input)
 }
 
 Result Registration::flush()
+{
+    if (!ExResource::takesFileDigests())
+        return flushUndigested();
+    const Kxg::FileRecords files = mBatch;
+    Result registered = flushUndigested();
+    return registered.good() ? digest(files) : registered;
+}
+
+/// After they are registered: whatever dies meanwhile leaves files without a digest, which is told and can be mended, and
+/// the database is not kept waiting for the disk.
+Result Registration::digest(const Kxg::FileRecords& files)
+{
+    std::vector<Kxg::FileDigest> wanted;
+    for (const Kxg::DicomFileRecord& file : files.dicom)
+        wanted.push_back({file.path, file.stamp, {}, false});
+    for (const Kxg::VolumeFileRecord& file : files.volumes)
+        wanted.push_back({file.path, file.stamp, {}, true});
+    return digestRegistered(mCatalogue, std::move(wanted));
+}
+
+Result Registration::flushUndigested()
 {
     if (mBatch.dicom.empty() && mBatch.volumes.empty() && mBatch.others.empty())
         return {};

@@ -23,8 +23,12 @@ public:
     /// Registers, when there are enough for a batch, this one and those before it. Failure: that of the database.
     Result add(const DicomInput& input);
 
-    /// Registers what is still waiting for a full batch.
+    /// Registers what is still waiting for a full batch. Where the site wants digests (`ExResource::takesFileDigests`), the
+    /// files are read for them.
     Result flush();
+
+    /// The same, but nothing is read: whoever took the bytes in has their digests.
+    Result flushUndigested();
 
     /// The studies that registered files belong to or were taken from.
     QList<QByteArray> studies() const { return mRequests.keys(); }
@@ -39,6 +43,8 @@ public:
     int volumes() const { return mVolumes; }
 
 private:
+    Result digest(const Kxg::FileRecords& files);
+
     Kxg::Catalogue& mCatalogue;
     Kxg::FileRecords mBatch;
     QHash<QByteArray, QVector<qint64>> mRequests;

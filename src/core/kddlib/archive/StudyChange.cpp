@@ -190,15 +190,15 @@ Result StudyChange::synchronise(const QByteArray& studyUID, TagFile& file)
     if (result.bad())
         return result;
     file.optimizeAll();
-    if (!file.writeCacheFile())
-        return unchanged(studyUID, file);
-    Kxg::BuiltStudy built = builtStudy(file);
-    // Files that wait to be built in are not opened here.
-    built.isComplete = false;
+    qint64 request = 0;
+    result = mCatalogue.requestRewrite(studyUID, request);
+    if (result.bad() || !file.writeCacheFile())
+        return result.bad() ? result : unchanged(studyUID, file);
     if (isStale)
         LogFile::warnf("The tag file of study %s was not the one written last; the study waits to be built",
                        studyUID.constData());
-    return claim->finish(built);
+    // Files that wait to be built in are not opened here.
+    return claim->finishChange(builtStudy(file), request);
 }
 
 }  // namespace Kdd

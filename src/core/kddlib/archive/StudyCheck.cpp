@@ -4,9 +4,9 @@
 #include "kddlib/archive/ArchiveDatabase.h"
 #include "kddlib/archive/DatasetVerifier.h"
 #include "kddlib/archive/FileWalk.h"
+#include "kddlib/archive/TagFileProof.h"
 #include "kddlib/archive/WorkObserver.h"
 #include "kddlib/net/dicom/KxDcmFileLoader.h"
-#include "kddlib/tagfile/StudyRecord.h"
 #include "kddlib/tagfile/TagFile.h"
 #include "kddlib/tagfile/qa/BuildCorrections.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
@@ -27,6 +27,9 @@ namespace Kdd
 
 namespace
 {
+
+/// For whoever works on a study that has to be looked at again [ms].
+constexpr int kPatience = 10 * 60 * 1000;
 
 QString textOf(const QByteArray& bytes)
 {
@@ -150,9 +153,11 @@ bool StudyCheck::read(const QByteArray& studyUID, TagFile& file)
 void StudyCheck::checkListing(const QByteArray& studyUID, const TagFile& file)
 {
     const QString study = textOf(studyUID);
-    if (!mContents.tagFile.digest.isEmpty() &&
-        !isTagFile(TagFile::cacheFilePathForStudy(studyUID.constData()), mContents.tagFile))
-        fault(QStringLiteral("The tag file of study %1 is not the one that was written last").arg(study));
+    TagFileProof proof(mCatalogue, studyUID);
+    if (!succeeded(proof.run(kPatience)))
+        ++mFindings.unreadable;
+    else if (proof.isFault())
+        fault(proof.fault() + QStringLiteral("; \"kdd build --all\" builds it anew"));
     QSet<QByteArray> listed;
     for (const Kxg::ListedImage& each : mContents.images) {
         const QByteArray& key = each.key();

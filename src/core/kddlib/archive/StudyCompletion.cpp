@@ -120,7 +120,14 @@ CompletedStudy StudyCompletion::reduce(Kxg::StudyClaim& claim)
 
 CompletedStudy StudyCompletion::build(Kxg::StudyClaim& claim)
 {
+    qint64 request = 0;
     Result known = read(claim);
+    // It may be built although nothing changed.
+    if (known.good() && !mContents.isWaiting && !mContents.images.empty())
+        known = mCatalogue.requestRewrite(claim.studyInstanceUID(), request);
+    // What came meanwhile is built in, for the claim takes it for done.
+    if (known.good() && request != 0)
+        known = read(claim);
     if (known.bad())
         return {known, false, {}};
     return mContents.images.empty() ? remove(claim) : build(claim, TagFile());

@@ -1,6 +1,7 @@
 #include "kddlib/archive/StudyStacker.h"
 
 #include "kddlib/archive/ArchiveDatabase.h"
+#include "kddlib/archive/ContentDigest.h"
 #include "kddlib/archive/FileWalk.h"
 #include "kddlib/archive/StudyCompletion.h"
 #include "kddlib/tagfile/TagFile.h"
@@ -10,6 +11,7 @@
 #include "platform/base/LogFile.h"
 #include "platform/os/FileStatus.h"
 #include "platform/os/PathName.h"
+#include "platform/resources/ExResource.h"
 
 #include <unistd.h>
 
@@ -74,7 +76,17 @@ bool StudyStacker::run()
         return isDone;
     mIsChanged = true;
     Kxg::RegistrationOutcome outcome;
-    return succeeded(mCatalogue.registerFiles(mMade, outcome)) && isDone;
+    return succeeded(mCatalogue.registerFiles(mMade, outcome)) && succeeded(digestMade()) && isDone;
+}
+
+Result StudyStacker::digestMade()
+{
+    if (!ExResource::takesFileDigests())
+        return {};
+    std::vector<Kxg::FileDigest> wanted;
+    for (const Kxg::VolumeFileRecord& file : mMade.volumes)
+        wanted.push_back({file.path, file.stamp, {}, true});
+    return digestRegistered(mCatalogue, std::move(wanted));
 }
 
 /// What a process that died while it wrote has left. The claim says that nobody writes there now.

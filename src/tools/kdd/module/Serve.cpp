@@ -88,6 +88,18 @@ void readLimits(const ServeRequest& request, Http::HttpSettings& http)
     http.stop = std::chrono::seconds(ExResource::serverStop());
 }
 
+std::optional<BackgroundCheck::Pace> checkPace()
+{
+    if (ExResource::checkRate() == 0)
+        return {};
+    BackgroundCheck::Pace pace;
+    pace.bytesPerSecond = ExResource::checkRate() * qint64(1024 * 1024);
+    pace.again = std::chrono::hours(ExResource::checkHours());
+    pace.heals = ExResource::checkHeals();
+    pace.records = ExResource::takesFileDigests();
+    return pace;
+}
+
 /// False, with the reason logged, when something is written that is none.
 bool readSettings(const GlobalOptions& options, const ServeRequest& request, ServerSettings& settings)
 {
@@ -100,6 +112,8 @@ bool readSettings(const GlobalOptions& options, const ServeRequest& request, Ser
     settings.prefix = ExResource::serverPrefix();
     settings.viewer =
         request.viewer.isEmpty() ? QFile::decodeName(ExResource::serverViewer()) : request.viewer;
+    settings.check = checkPace();
+    settings.provesTagFiles = ExResource::serverProvesTagFiles();
     settings.slow = std::chrono::milliseconds(ExResource::serverSlow());
     settings.addresses.publicAddress = orElse(request.publicAddress, ExResource::serverPublicAddress());
     settings.addresses.hosts = wordsOf(ExResource::serverHosts()) + request.hosts.toVector();

@@ -1,0 +1,434 @@
+#include "kddlib/archive/StudyProof.h"
+
+#include "kddlib/archive/ArchiveDatabase.h"
+#include "kddlib/archive/BackgroundCheck.h"
+#include "kddlib/archive/DicomInput.h"
+#include "kddlib/archive/StudyBuilders.h"
+#include "kddlib/archive/StudyCheck.h"
+#include "kddlib/archive/StudyIntake.h"
+#include "kddlib/archive/StudyStacker.h"
+#include "kddlib/archive/WorkObserver.h"
+#include "kddlib/tagfile/TagFile.h"
+#include "kddlib/volumes/VolumeInfo.h"
+#include "platform/database/Kxg.h"
+#include "platform/database/StudyProofs.h"
+#include "platform/volumefile/OrlanMesh.h"
+#include "support/DatasetBuilder.h"
+#include "support/FileContent.h"
+#include "support/LogCapture.h"
+#include "support/PostgresServer.h"
+#include "support/Setting.h"
+#include "support/TemporaryStore.h"
+
+#include <QCryptographicHash>
+#include <QFile>
+#include <QThread>
+
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <atomic>
+#include <thread>
+
+using namespace Kdd;
+
+namespace
+{
+
+#ifdef __SANITIZE_ADDRESS__
+constexpr int kStep = 41;  // every byte would take minutes there
+#else
+constexpr int kStep = 1;
+#endif
+
+enum class Time { Kept, Now };
+
+/// What a disk does to a byte, or a program.
+void flip(const QString& path, qint64 at, Time time = Time::Kept)
+{
+    const int file = ::open(path.toUtf8().constData(), O_RDWR | O_CLOEXEC);
+    struct stat status = {};
+    char byte = 0;
+    ASSERT_EQ(::fstat(file, &status), 0);
+    ASSERT_EQ(::pread(file, &byte, 1, at), 1);
+    byte = static_cast<char>(byte ^ (1 << (at % 8)));
+    ASSERT_EQ(::pwrite(file, &byte, 1, at), 1);
+    const timespec times[2] = {status.st_atim, status.st_mtim};
+    if (time == Time::Kept) {
+        ASSERT_EQ(::futimens(file, times), 0);
+    }
+    ::close(file);
+}
+
+DatasetBuilder aSlice(int number, const char* study = "1.1")
+{
+    const QByteArray text = QByteArray::number(number);
+    DatasetBuilder image = anImage((QByteArray(study) + ".7." + text).constData()).inStudy(study);
+    image.inSeries((QByteArray(study) + ".1").constData()).with(DCM_InstanceNumber, text.constData());
+    image.with(DCM_ImagePositionPatient, ("0\\0\\" + text).constData()).with(DCM_PixelSpacing, "1\\1");
+    image.with(DCM_ImageOrientationPatient, "1\\0\\0\\0\\1\\0").with(DCM_FrameOfReferenceUID, study);
+    image.with(DCM_Columns, "4").with(DCM_Rows, "3").with(DCM_PhotometricInterpretation, "MONOCHROME2");
+    image.with(DCM_SamplesPerPixel, "1").with(DCM_BitsAllocated, "16").with(DCM_BitsStored, "16");
+    image.with(DCM_HighBit, "15").with(DCM_PixelRepresentation, "0");
+    return image.words({0, 1, 2, 3, 1000, 2000, 3000, 4000, 4095, 5, 6, 7});
+}
+
+/// All that readers are given of a volume file; empty when they are refused.
+QByteArray shownOf(const QByteArray& path)
+{
+    Result result;
+    const auto mesh = OrlanMesh::read(path, result);
+    QByteArray shown;
+    if (mesh == nullptr)
+        return {};
+    for (const Lattice& lattice : mesh->lattices()) {
+        shown += lattice.name;
+        for (int slice = 0; slice < lattice.dims.value(2, 1); ++slice) {
+            TypedData2D pixels;
+            if (mesh->readSlice(lattice, slice, pixels).bad())
+                return {};
+            shown += pixels.pixels;
+        }
+    }
+    QVector<quint64> counts;
+    if (mesh->readDataSection("Histogram", counts).bad())
+        return {};
+    for (const quint64 count : counts)
+        shown += QByteArray::number(count) + ' ';
+    return shown + dicomValue(*mesh, "G0020-000E");
+}
+
+class StudyProofTest : public testing::TestWithParam<const char*>
+{
+protected:
+    StudyProofTest()
+    {
+        Kxg::SetDatabaseServer(mAddress);
+        mCatalogue = openCatalogue();
+    }
+    ~StudyProofTest() override { Kxg::SetDatabaseServer(QByteArray()); }
+
+    QString save(const DatasetBuilder& image, const char* name) const
+    {
+        DcmDataset copy(image.build());
+        DcmFileFormat format(&copy);
+        const QString path = mFiles.filePath(QString::fromLatin1(name));
+        EXPECT_TRUE(format.saveFile(path.toUtf8().constData(), EXS_LittleEndianExplicit).good());
+        return path;
+    }
+
+    void take(const QStringList& paths)
+    {
+        StudyIntake intake(*mCatalogue, mObserver);
+        for (const QString& path : paths)
+            ASSERT_TRUE(intake.take(readDicomInput(path.toUtf8(), Damage::Refused)).good());
+        ASSERT_TRUE(intake.finish().good());
+    }
+
+    /// Study 1.1 with three images and a volume; study 1.2 with one image.
+    void fill()
+    {
+        take({save(aSlice(1), "1"), save(aSlice(2), "2"), save(aSlice(3), "3"), save(aSlice(1, "1.2"), "4")});
+        ASSERT_TRUE(StudyStacker(*mCatalogue, {mFiles.filePath(QStringLiteral("volumes"))}).stack("1.1"));
+    }
+
+    static QString tagFile(const char* study = "1.1") { return TagFile::cacheFilePathForStudy(study); }
+
+    QByteArray volume()
+    {
+        QVector<QByteArray> paths;
+        EXPECT_TRUE(mCatalogue->volumeFiles("1.1", paths).good());
+        return paths.value(0);
+    }
+
+    /// What the proof tells of the study's tag file, or of its other files, in place of what was told before.
+    StudyProof::Findings ofTagFile(bool heals = false, const char* study = "1.1")
+    {
+        mTold.clear();
+        StudyProof::Rules rules;
+        rules.heals = heals;
+        StudyProof proof(*mCatalogue, rules,
+                         [this](const QString& fault) { mTold += fault.toStdString() + '\n'; });
+        EXPECT_TRUE(proof.checkTagFile(study).good());
+        return proof.findings();
+    }
+    StudyProof::Findings ofFiles(bool records = false, const char* study = "1.1")
+    {
+        mTold.clear();
+        StudyProof::Rules rules;
+        rules.records = records;
+        StudyProof proof(*mCatalogue, rules,
+                         [this](const QString& fault) { mTold += fault.toStdString() + '\n'; });
+        QByteArray position;
+        bool isDone = false;
+        EXPECT_TRUE(proof.checkFiles(study, position, isDone).good());
+        EXPECT_TRUE(isDone);
+        return proof.findings();
+    }
+
+    bool isTold(const char* what) const { return mTold.find(what) != std::string::npos; }
+
+    /// Looks until it is so, for as long as it takes on a busy machine.
+    template <typename Condition>
+    static bool comesTrue(const Condition& condition)
+    {
+        for (int look = 0; look < 6000 && !condition(); ++look)
+            QThread::msleep(1);
+        return condition();
+    }
+
+    LogCapture mLog;
+    TemporaryStore mStore;
+    QTemporaryDir mFiles;
+    QByteArray mAddress = QByteArray(GetParam()) == "Sqlite"
+                              ? "sqlite:" + mStore.filePath("kdd.sqlite").toUtf8()
+                              : newPostgresDatabase();
+    WorkObserver mObserver;
+    std::unique_ptr<Kxg::Catalogue> mCatalogue;
+    std::string mTold;
+};
+
+INSTANTIATE_TEST_SUITE_P(Engines, StudyProofTest, testing::Values("Sqlite", "Postgres"),
+                         [](const auto& engine) { return engine.param; });
+
+// ---- tag files
+
+TEST_P(StudyProofTest, EveryByteOfATagFileCounts)
+{
+    fill();
+    const qint64 size = QFile(tagFile()).size();
+    TagFile file;
+    ASSERT_TRUE(file.readCacheFileForStudy("1.1", false));
+    ASSERT_GT(file.statistics().blobs, 0);
+    ASSERT_GT(file.statistics().volumes, 0);
+    ASSERT_EQ(ofTagFile().tagFiles, 1);
+    for (qint64 at = 0; at < size; at += QByteArray(GetParam()) == "Sqlite" ? kStep : 101) {
+        flip(tagFile(), at);
+        ASSERT_EQ(ofTagFile().faults, 1) << at;
+        ASSERT_TRUE(isTold("is damaged")) << at << mTold;
+        flip(tagFile(), at);
+    }
+    EXPECT_EQ(ofTagFile().faults, 0) << mTold;
+    // What a longer study left behind its end says nothing.
+    QFile longer(tagFile());
+    ASSERT_TRUE(longer.open(QIODevice::Append));
+    longer.write("left over");
+    longer.close();
+    EXPECT_EQ(ofTagFile().faults, 0) << mTold;
+}
+
+TEST_P(StudyProofTest, ATagFileThatComesBackIsKnownAsOldAndHealed)
+{
+    fill();
+    const QByteArray before = fileContent(tagFile());
+    take({save(aSlice(4), "5")});
+    const QByteArray last = fileContent(tagFile());
+    ASSERT_NE(before, last);
+    putFile(tagFile(), before);
+    EXPECT_EQ(ofTagFile().faults, 1);
+    EXPECT_TRUE(isTold("an earlier one of this archive; \"kdd build --all\" builds it anew")) << mTold;
+    std::string told;
+    StudyCheck check(*mCatalogue, mObserver, [&](const QString& fault) { told += fault.toStdString(); });
+    check.check("1.1");
+    EXPECT_NE(told.find("an earlier one of this archive"), std::string::npos) << told;
+    EXPECT_EQ(ofTagFile(true).healed, 1);
+    EXPECT_TRUE(isTold("is built anew")) << mTold;
+    EXPECT_EQ(ofTagFile().faults, 0);
+    EXPECT_EQ(fileContent(tagFile()), last);
+}
+
+TEST_P(StudyProofTest, WhatSomethingElseWroteIsToldFromDamage)
+{
+    fill();
+    TagFile file;
+    ASSERT_TRUE(file.readCacheFileForStudy("1.1", true));
+    const char* image = "1.1.7.3";
+    ASSERT_EQ(file.removeImages(1, &image), 1);
+    ASSERT_TRUE(file.writeCacheFile());
+    EXPECT_EQ(ofTagFile().faults, 1);
+    EXPECT_TRUE(isTold("something else wrote it")) << mTold;
+    QFile::resize(tagFile(), 30);
+    ofTagFile();
+    EXPECT_TRUE(isTold("is damaged: it cannot be read")) << mTold;
+    QFile::resize(tagFile(), 0);
+    ofTagFile();
+    EXPECT_TRUE(isTold("is damaged: it is empty")) << mTold;
+    QFile::remove(tagFile());
+    EXPECT_EQ(ofTagFile(true).healed, 1);
+    EXPECT_TRUE(isTold("is not there")) << mTold;
+    EXPECT_EQ(ofTagFile().faults, 0) << mTold;
+}
+
+TEST_P(StudyProofTest, AStudyThatWaitsAfterItsWriterDiedIsNoFault)
+{
+    fill();
+    std::unique_ptr<Kxg::StudyClaim> claim;
+    ASSERT_TRUE(mCatalogue->requestBuild({"1.1"}).good());
+    ASSERT_TRUE(mCatalogue->claim("1.1", 0, claim).good());
+    flip(tagFile(), 20, Time::Now);  // and it dies before the database knows
+    claim.reset();
+    EXPECT_EQ(ofTagFile(true).faults, 0) << mTold;
+    StudyBuilders(mObserver, 1).buildWaiting(1);
+    EXPECT_EQ(ofTagFile().tagFiles, 1);
+    EXPECT_EQ(mTold, "");
+}
+
+TEST_P(StudyProofTest, WhatIsBeingWrittenIsNoFault)
+{
+    const Setting digests("KDD_FILE_DIGESTS", "1");
+    fill();
+    std::atomic<bool> isDone{false};
+    std::thread others([&] {
+        for (int i = 0; i < 40; ++i)
+            StudyBuilders(mObserver, 1, i % 2 == 0).build({"1.1"});
+        isDone = true;
+    });
+    int looks = 0;
+    int faults = 0;
+    std::string told;
+    for (; !isDone || looks == 0; ++looks) {
+        faults += ofTagFile().faults;
+        told += mTold;
+        faults += ofFiles().faults;
+        told += mTold;
+    }
+    others.join();
+    EXPECT_EQ(faults, 0) << looks << '\n' << told;
+}
+
+// ---- DICOM and volume files
+
+TEST_P(StudyProofTest, EveryByteOfADicomFileCountsOnceItHasADigest)
+{
+    fill();
+    EXPECT_EQ(ofFiles().undigested, 3);
+    EXPECT_EQ(ofFiles(true).recorded, 4);
+    EXPECT_EQ(ofFiles().undigested, 0);
+    const QString path = mFiles.filePath(QStringLiteral("2"));
+    for (qint64 at = 0; at < QFile(path).size(); at += QByteArray(GetParam()) == "Sqlite" ? kStep : 101) {
+        flip(path, at);
+        ASSERT_EQ(ofFiles().faults, 1) << at;
+        ASSERT_TRUE(isTold("/2 is damaged: its bytes have changed")) << mTold;
+        flip(path, at);
+    }
+    EXPECT_EQ(ofFiles().faults, 0) << mTold;
+    flip(path, QFile(path).size() - 2, Time::Now);
+    EXPECT_EQ(ofFiles(true).faults, 1);
+    EXPECT_TRUE(isTold("was changed since it was registered")) << mTold;
+    take({path});
+    EXPECT_EQ(ofFiles().undigested, 1) << "the digest was of other bytes";
+    EXPECT_EQ(ofFiles().faults, 0) << mTold;
+    QFile::remove(path);
+    EXPECT_EQ(ofFiles().faults, 1);
+    EXPECT_TRUE(isTold("is not there")) << mTold;
+}
+
+TEST_P(StudyProofTest, AFlipInAVolumeFileIsNoticedOrHarmless)
+{
+    fill();
+    const QByteArray path = volume();
+    const QByteArray shown = shownOf(path);
+    ASSERT_FALSE(shown.isEmpty());
+    const qint64 size = QFile(QString::fromUtf8(path)).size();
+    int noticed = 0;
+    for (qint64 at = 0; at < size; at += QByteArray(GetParam()) == "Sqlite" ? kStep : 101) {
+        flip(QString::fromUtf8(path), at);
+        const int faults = ofFiles().faults;
+        noticed += faults;
+        ASSERT_TRUE(faults == 1 || shownOf(path) == shown) << at;
+        flip(QString::fromUtf8(path), at);
+    }
+    EXPECT_GT(noticed, 0);
+    // By its digest every byte counts.
+    EXPECT_EQ(ofFiles(true).recorded, 4);
+    for (qint64 at = 0; at < size; at += 41) {
+        flip(QString::fromUtf8(path), at);
+        ASSERT_EQ(ofFiles().faults, 1) << at;
+        flip(QString::fromUtf8(path), at);
+    }
+}
+
+TEST_P(StudyProofTest, WhoRegistersTakesDigestsWhereTheSiteWantsThem)
+{
+    const Setting digests("KDD_FILE_DIGESTS", "1");
+    fill();
+    std::vector<Kxg::FileDigest> files;
+    ASSERT_TRUE(mCatalogue->fileDigests("1.1", files).good());
+    ASSERT_EQ(files.size(), 4U);
+    for (const Kxg::FileDigest& file : files)
+        EXPECT_EQ(file.digest, QCryptographicHash::hash(fileContent(QString::fromUtf8(file.path)),
+                                                        QCryptographicHash::Sha256));
+}
+
+// ---- in the background
+
+constexpr BackgroundCheck::Pace kSwift = {qint64(1) << 30,
+                                          std::chrono::hours(1),
+                                          true,
+                                          true,
+                                          std::chrono::milliseconds(5),
+                                          std::chrono::milliseconds(0),
+                                          std::chrono::milliseconds(5)};
+
+TEST_P(StudyProofTest, TheBackgroundFindsAndHealsAndGoesOnWhereItWas)
+{
+    fill();
+    ofFiles(true);
+    ofFiles(true, "1.2");
+    flip(tagFile(), QFile(tagFile()).size() - 5);
+    const QString rotten = mFiles.filePath(QStringLiteral("4"));
+    flip(rotten, QFile(rotten).size() - 2);
+    {
+        BackgroundCheck first(kSwift);
+        BackgroundCheck second(kSwift);
+        first.start();
+        second.start();
+        ASSERT_TRUE(comesTrue([&] { return first.counts().studies + second.counts().studies == 2; }));
+        const auto one = first.counts();
+        const auto other = second.counts();
+        EXPECT_TRUE(one.studies == 0 || other.studies == 0) << "one is at work";
+        EXPECT_EQ(one.faults + other.faults, 2);
+        EXPECT_EQ(one.healed + other.healed, 1);
+        ASSERT_TRUE(comesTrue([&] { return first.counts().faulty == 1 && second.counts().faulty == 1; }));
+    }
+    EXPECT_EQ(mLog.count("The tag file of study 1.1 is built anew"), 1);
+    EXPECT_EQ(mLog.count("/4 is damaged"), 1);
+    EXPECT_EQ(ofTagFile().faults, 0) << mTold;
+    // Both were looked at within the hour.
+    BackgroundCheck later(kSwift);
+    later.start();
+    ASSERT_TRUE(comesTrue([&] { return later.counts().faulty == 1 || later.counts().studies > 0; }));
+    Kxg::CheckedStudy next;
+    ASSERT_TRUE(mCatalogue->nextToCheck(1, next).good());
+    EXPECT_EQ(next.studyInstanceUID, "");
+    EXPECT_EQ(later.counts().studies, 0);
+}
+
+TEST_P(StudyProofTest, TheBackgroundEndsInTheMiddleAndLaterGoesOn)
+{
+    fill();
+    BackgroundCheck::Pace slow = kSwift;
+    slow.bytesPerSecond = 1;
+    {
+        BackgroundCheck check(slow);
+        check.start();
+        ASSERT_TRUE(comesTrue([&] { return check.counts().bytes > 0; }));
+    }
+    Kxg::CheckedStudy next;
+    ASSERT_TRUE(mCatalogue->nextToCheck(1, next).good());
+    EXPECT_EQ(next.studyInstanceUID, "1.1");
+    // As one left it that ended after the second file.
+    next.position = mFiles.filePath(QStringLiteral("2")).toUtf8();
+    next.faults = 1;
+    ASSERT_TRUE(mCatalogue->noteCheck(next, false).good());
+    flip(tagFile(), 20);
+    BackgroundCheck check(kSwift);
+    check.start();
+    ASSERT_TRUE(comesTrue([&] { return check.counts().studies == 2; }));
+    EXPECT_EQ(check.counts().faults, 0) << "the tag file was looked at before";
+    ASSERT_TRUE(comesTrue([&] { return check.counts().faulty == 1; })) << "the fault of before counts";
+}
+
+}  // namespace
