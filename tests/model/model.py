@@ -11,7 +11,7 @@ a build makes. A sequence that fails is shortened as far as it goes and printed,
 those of a folder.
 
 --pairs PAGE does each operation after each other one, and tells how many of the cells of the page's tables that covers: all,
-or it fails. With --every 7 each seventh pair is done.
+or it fails. With --every 7 each seventh pair is done, from the one that --seed numbers.
 """
 import argparse
 import os
@@ -84,7 +84,7 @@ def sequences(wanted):
             with open(os.path.join(folder, name), encoding="utf-8") as text:
                 yield name, [line.strip() for line in text if line.strip() and line[0] != "#"]
     elif wanted.pairs:
-        yield from list(pairs.sequences())[::wanted.every]
+        yield from list(pairs.sequences())[wanted.seed - 1::wanted.every]
     else:
         for number in range(wanted.steps // wanted.length + 1):
             seed = wanted.seed + number
@@ -107,7 +107,7 @@ def main():
     parser.add_argument("--every", type=int, default=1)
     parser.add_argument("--faults", type=int, default=1, help="how many are looked for before it ends")
     wanted = parser.parse_args()
-    began, count, faults = time.monotonic(), 0, 0
+    began, faults, done = time.monotonic(), 0, set()
     with tempfile.TemporaryDirectory(prefix="kddmodel", dir=wanted.folder) as folder:
         machine = Machine(wanted, folder)
         try:
@@ -116,7 +116,7 @@ def main():
                 if time.monotonic() - began > wanted.seconds or (is_random and wanted.steps <= machine.steps):
                     break
                 found = machine.run(lines)
-                count += 1
+                done.add(name)
                 if found:
                     faults += 1
                     machine.report(lines, found, name)
@@ -125,12 +125,13 @@ def main():
         finally:
             machine.database.close()
     if wanted.pairs:
-        told, untold, undone = pairs.told(wanted.pairs)
-        print("%d cells of %s are covered; not told there: %s; not done here: %s" % (told, wanted.pairs, untold, undone))
+        cells, untold, undone = pairs.told(wanted.pairs)
+        print("%d of %d cells of the page were done; it does not tell of: %s; nothing does: %s" % (
+            len(cells & pairs.cells_of(done)), len(cells), untold, undone))
         faults += len(untold) + len(undone)
     seconds = time.monotonic() - began
     print("%d %s, %d steps, %d differences, %.0f s, %.1f steps a second, %s, from seed %d" % (
-        count, "pairs" if wanted.pairs else "sequences", machine.steps, faults, seconds, machine.steps / seconds,
+        len(done), "pairs" if wanted.pairs else "sequences", machine.steps, faults, seconds, machine.steps / seconds,
         wanted.database, wanted.seed))
     raise SystemExit(1 if faults else 0)
 

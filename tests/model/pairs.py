@@ -63,11 +63,20 @@ def sequences():
     for first in OPERATIONS:
         for second in OPERATIONS:
             lines = (first[3] + "; " + second[-1 if first is second else 3]).split("; ")
-            yield "%s, then %s" % (first[0], second[0]), ["quietly " + line for line in BEFORE] + lines + ["build-all"]
+            yield name_of(first, second), ["quietly " + line for line in BEFORE] + lines + ["build-all"]
+
+
+def cells_of(names):
+    """Where the page tells of what was done."""
+    return {(first[1], second[2]) for first in OPERATIONS for second in OPERATIONS if name_of(first, second) in names}
+
+
+def name_of(first, second):
+    return "%s, then %s" % (first[0], second[0])
 
 
 def told(page):
-    """How many cells the page's tables have of pairs, pairs of which they have none, and cells of which there is no pair."""
+    """The cells that the page's tables have, pairs of which they have none, and cells of which there is no pair."""
     with open(page, encoding="utf-8") as text:
         lines = [line for line in text if line.startswith("|")]
     cells, columns = set(), None
@@ -80,4 +89,4 @@ def told(page):
         elif not words[0].startswith("-"):
             columns = None
     done = {(first[1], second[2]) for first in OPERATIONS for second in OPERATIONS}
-    return len(done & cells), sorted(done - cells), sorted(cells - done)
+    return cells, sorted(done - cells), sorted(cells - done)
