@@ -61,6 +61,20 @@ TEST_F(Correction, TellsWhatItDid)
     EXPECT_EQ(correct(file("job.xml"), "--study 1.2 --image 4").exitCode, 0) << "it is done already";
 }
 
+TEST_F(Correction, AnImageThatWasReplacedComesBackWhenTheOtherOneMovesOn)
+{
+    addTwoStudies();
+    save("5", anImage("4").inStudy("1.2").inSeries("1.2.4").with(DCM_PatientName, "Doe^J"));
+    save("6", anImage("6").inStudy("1.3").inSeries("1.3.1"));
+    EXPECT_EQ(addImages().exitCode, 0);
+    EXPECT_EQ(correct(job("1.2", kSeries, "1.3.1"), "--study 1.3 --image 4").number("moved"), 1);
+    EXPECT_EQ(correct(job("1.3", kSeries, "1.2.4"), "--study 1.2 --image 4").number("moved"), 1);
+    EXPECT_EQ(listed("--waiting"), "1.3");
+    EXPECT_EQ(kdd("build").exitCode, 0);
+    EXPECT_EQ(stored("1.3"), (QSet<QByteArray>{"4", "6"}));
+    EXPECT_EQ(kdd("verify --all").exitCode, 0);
+}
+
 TEST_F(Correction, IsPreviewedWithoutAnyChange)
 {
     addTwoStudies();

@@ -25,7 +25,7 @@ std::string ArchiveModel::keyOf(const std::string& path, const ModelFile& file)
 void ArchiveModel::write(const std::string& path, const ModelFile& content)
 {
     mDisk[path] = content;
-    mVersions[path] = ++mLastVersion;
+    touch(path);
 }
 
 void ArchiveModel::spoil(const std::string& study, const ModelStudy* content, bool isThere)

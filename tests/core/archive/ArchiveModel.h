@@ -44,10 +44,19 @@ public:
     // ---- the world outside
 
     void write(const std::string& path, const ModelFile& content);
+
+    /// In the same tick of the clock and of the same length, so that nobody can tell.
+    void rewrite(const std::string& path, const ModelFile& content) { mDisk[path] = content; }
+
+    /// Its clock is set, and it stays what it is.
+    void touch(const std::string& path) { mVersions[path] = ++mLastVersion; }
     void removeFromDisk(const std::string& path) { mDisk.erase(path); }
 
     /// What somebody puts in the place of a tag file that shows `content`; null: nothing that can be read.
     void spoil(const std::string& study, const ModelStudy* content, bool isThere);
+
+    /// What was put in its place is the very one that was written last.
+    void recognise(const std::string& study) { mSpoiled.erase(study); }
 
     // ---- operations
 

@@ -4,6 +4,7 @@
 #include <gtest/gtest.h>
 
 #include <cstdlib>
+#include <numeric>
 
 using namespace Kdd;
 
@@ -16,12 +17,15 @@ class Sequence : public ArchiveOperations
 public:
     using ArchiveOperations::ArchiveOperations;
 
-    /// Until the first difference.
-    void run(int steps)
+    /// Until the first difference. Which steps these are does not depend on those before them, so that some can be left out.
+    void run(unsigned seed, const std::vector<unsigned>& steps)
     {
-        for (int i = 0; i < steps && mFault.empty(); ++i) {
+        for (auto it = steps.begin(); it != steps.end() && mFault.empty(); ++it) {
+            std::seed_seq numbers{seed, *it};
+            mRandom.seed(numbers);
             step();
             compare();
+            noteWritten();
         }
         if (mFault.empty())
             compareWithFreshBuild();
@@ -31,8 +35,12 @@ protected:
     void step()
     {
         const unsigned what = pick(100);
-        if (what < 28)
+        if (what < 24)
             write(pickPath());
+        else if (what < 26)
+            rewrite(pickPath());
+        else if (what < 28)
+            touch(pickPath());
         else if (what < 33)
             removeFile(pickPath());
         else if (what < 49)
@@ -293,13 +301,40 @@ unsigned setting(const char* name, unsigned standard)
 
 constexpr unsigned kStepsOfSequence = 40;
 
-void expectAgreement(unsigned first, unsigned steps, QByteArray (*newDatabase)())
+using NewDatabase = QByteArray (*)();
+
+/// What differed, and after which steps; empty when nothing did.
+std::string faultOf(NewDatabase newDatabase, unsigned seed, const std::vector<unsigned>& steps)
 {
-    for (unsigned seed = first; seed < first + steps / kStepsOfSequence && !testing::Test::HasFailure();
+    Sequence sequence(newDatabase(), seed);
+    sequence.run(seed, steps);
+    return sequence.fault().empty() ? "" : sequence.fault() + "\nafter\n" + sequence.story();
+}
+
+/// Leaves out step after step as long as something differs still.
+std::string shortest(NewDatabase newDatabase, unsigned seed, std::vector<unsigned> steps, std::string fault)
+{
+    for (std::size_t i = steps.size(); i-- > 0;) {
+        std::vector<unsigned> fewer = steps;
+        fewer.erase(fewer.begin() + static_cast<std::ptrdiff_t>(i));
+        const std::string found = faultOf(newDatabase, seed, fewer);
+        if (found.empty())
+            continue;
+        steps.swap(fewer);
+        fault = found;
+    }
+    return fault;
+}
+
+void expectAgreement(unsigned first, unsigned count, NewDatabase newDatabase)
+{
+    std::vector<unsigned> steps(kStepsOfSequence);
+    std::iota(steps.begin(), steps.end(), 0U);
+    for (unsigned seed = first; seed < first + count / kStepsOfSequence && !testing::Test::HasFailure();
          ++seed) {
-        Sequence sequence(newDatabase(), seed);
-        sequence.run(kStepsOfSequence);
-        EXPECT_EQ(sequence.fault(), "") << "seed " << seed << ", after\n" << sequence.story();
+        const std::string fault = faultOf(newDatabase, seed, steps);
+        if (!fault.empty())
+            ADD_FAILURE() << "seed " << seed << ": " << shortest(newDatabase, seed, steps, fault);
     }
 }
 

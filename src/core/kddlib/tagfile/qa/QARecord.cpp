@@ -11,6 +11,8 @@
 #include "platform/base/LogFile.h"
 #include "platform/database/Kxg.h"
 
+#include <QSet>
+
 #include <dcmtk/dcmdata/dcdeftag.h>
 
 #include <algorithm>
@@ -328,6 +330,24 @@ Result QARecord::takeBack()
     return {};
 }
 
+/// Whether an image is listed now that stood behind one which left: only a build can read it.
+bool QARecord::uncovers(const StudyTree& tree, const QByteArray& studyUID)
+{
+    QSet<QByteArray> left;
+    for (const QAImageChange& change : mChanges) {
+        if (change.studyUID == studyUID && tree.findImage(change.key) == nullptr)
+            left.insert(change.key);
+    }
+    if (left.isEmpty())
+        return false;
+    Kxg::StudyContents contents;
+    // In doubt it is built.
+    if (mCatalogue->studyContents(studyUID, contents).bad())
+        return true;
+    return std::any_of(contents.images.begin(), contents.images.end(),
+                       [&](const Kxg::ListedImage& listed) { return left.contains(listed.key()); });
+}
+
 void QARecord::finish(const StudyTree& tree, const Kxg::TagFileStamp& stamp, const QByteArray& studyUID)
 {
     const auto found = mStudies.find(studyUID);
@@ -347,7 +367,7 @@ void QARecord::finish(const StudyTree& tree, const Kxg::TagFileStamp& stamp, con
     if (!study.isRecognised) {
         result = study.claim->noteSearch(shown);
     } else if (!tree.isEmpty()) {
-        result = study.claim->finishChange(shown, request);
+        result = study.claim->finishChange(shown, uncovers(tree, studyUID) ? 0 : request);
     } else {
         Kxg::StudyContents left;
         result = mCatalogue->studyContents(studyUID, left);

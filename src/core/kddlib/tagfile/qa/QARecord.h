@@ -68,8 +68,8 @@ public:
     /// Makes what `record` did undone. On failure what was recorded stays.
     Result takeBack();
 
-    /// To be called for each study when the tag files are written: the study does not wait for what was recorded. A
-    /// fault is warned about, for the study is built once more then.
+    /// To be called for each study when the tag files are written: the study does not wait for what was recorded, unless an
+    /// image that had been replaced came to light. A fault is warned about, for the study is built once more then.
     void finish(const StudyTree& tree, const Kxg::TagFileStamp& stamp, const QByteArray& studyUID);
 
 private:
@@ -92,6 +92,7 @@ private:
                                           const AuditLog& log) const;
     const Kxg::ImageCorrection* find(const ImageIdentity& identity) const;
     Result add(const QAImageChange& change, const Kxg::ImageCorrection& former);
+    bool uncovers(const StudyTree& tree, const QByteArray& studyUID);
 
     std::unique_ptr<Kxg::Catalogue> mCatalogue;  // null when nothing is to be kept
     std::map<QByteArray, Study> mStudies;        // those that are claimed
