@@ -371,6 +371,9 @@ public:
     /// Takes out of `paths` what is known, and what was removed and not registered again.
     virtual Kdd::Result dropKnown(QSet<QByteArray>& paths) = 0;
 
+    /// The stamps of those of the paths that are known.
+    virtual Kdd::Result stampsOf(const QList<QByteArray>& paths, QHash<QByteArray, FileStamp>& stamps) = 0;
+
 protected:
     Catalogue() = default;
 };

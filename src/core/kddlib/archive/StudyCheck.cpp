@@ -5,7 +5,8 @@
 #include "kddlib/archive/DatasetVerifier.h"
 #include "kddlib/archive/FileWalk.h"
 #include "kddlib/archive/WorkObserver.h"
-#include "kddlib/net/dicom/KxDcmFileLoader.h"
+#include "kddlib/net/dicom/RemoteDicom.h"
+#include "kddlib/net/http/ObjectAddress.h"
 #include "kddlib/tagfile/StudyRecord.h"
 #include "kddlib/tagfile/TagFile.h"
 #include "kddlib/tagfile/qa/BuildCorrections.h"
@@ -30,7 +31,14 @@ namespace
 
 QString textOf(const QByteArray& bytes)
 {
-    return pathText(bytes);
+    return pathText(shownAddress(bytes));
+}
+
+LoadedHeader loadHeader(const QByteArray& path)
+{
+    LoadedHeader loaded{std::make_unique<DcmFileFormat>(), {}};
+    loaded.condition = loadDicomHeader(path, *loaded.format);
+    return loaded;
 }
 
 /// Why a study's tag file cannot be read, more plainly than the reader can tell.
@@ -124,10 +132,23 @@ void StudyCheck::check(const QByteArray& studyUID)
     if (!mContents.isWaiting)
         checkListing(studyUID, file);
     checkPreviews(studyUID, file);
-    qint64 done = 0;
+    checkImages(file);
+}
+
+void StudyCheck::checkImages(const TagFile& file)
+{
     const auto& images = file.imagesByUID();
+    QList<QByteArray> urls;
+    for (const TagMap* image : images) {
+        const QByteArray path = filePathOf(*image);
+        if (isObjectAddress(path))
+            urls.append(path);
+    }
+    RemoteHeaders ahead(urls, kRemoteHead);
+    qint64 done = 0;
     for (auto it = images.cbegin(); it != images.cend() && !mObserver.isCancelled(); ++it) {
-        checkImage(it.key(), *it.value());
+        const QByteArray path = filePathOf(*it.value());
+        checkImage(it.key(), *it.value(), isObjectAddress(path) ? ahead.next() : loadHeader(path));
         mObserver.progress(++done, images.size());
     }
 }
@@ -213,17 +234,16 @@ void StudyCheck::checkPreviews(const QByteArray& studyUID, const TagFile& file)
                   .arg(missing));
 }
 
-void StudyCheck::checkImage(const QByteArray& key, const TagMap& image)
+void StudyCheck::checkImage(const QByteArray& key, const TagMap& image, LoadedHeader loaded)
 {
     const QByteArray path = filePathOf(image);
-    DcmFileFormat dicom;
-    const OFCondition condition = loadDicomFile(path.constData(), dicom);
-    if (condition.bad()) {
+    if (loaded.condition.bad()) {
         ++mFindings.unreadable;
-        mReport(
-            QStringLiteral("Could not load %1: %2").arg(textOf(path), QString::fromLatin1(condition.text())));
+        mReport(QStringLiteral("Could not load %1: %2")
+                    .arg(textOf(path), QString::fromLatin1(loaded.condition.text())));
         return;
     }
+    DcmFileFormat& dicom = *loaded.format;
     ++mFindings.images;
     const auto report = [&](const QByteArray& attribute, const QByteArray& what) {
         mReport(QStringLiteral("Image %1: %2 %3").arg(textOf(key), textOf(attribute), textOf(what)));

@@ -1,7 +1,7 @@
 #pragma once
 
+#include "kddlib/items/PlainSource.h"
 #include "kddlib/tagmodel/VrCode.h"
-#include "platform/os/RandomAccessFile.h"
 
 #include <QByteArray>
 #include <QHash>
@@ -20,7 +20,7 @@ class FileWindow
 {
 public:
     /// The file must outlive the object.
-    explicit FileWindow(const RandomAccessFile& file)
+    explicit FileWindow(PlainSource& file)
         : mFile(file)
     {
     }
@@ -49,7 +49,7 @@ public:
 private:
     const char* fill(qint64 offset, qint64 count);
 
-    const RandomAccessFile& mFile;
+    PlainSource& mFile;
     qint64 mStart = 0;
     qint64 mCount = 0;
     qint64 mSpan = 16 * 1024;

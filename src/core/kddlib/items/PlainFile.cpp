@@ -78,7 +78,7 @@ bool isPixelKey(const DcmTagKey& key)
 class PlainReader
 {
 public:
-    explicit PlainReader(const RandomAccessFile& file)
+    explicit PlainReader(PlainSource& file)
         : mBytes(file)
         , mHeads(mBytes)
     {
@@ -313,7 +313,7 @@ PlainImage::PlainImage(PlainImage&&) noexcept = default;
 PlainImage& PlainImage::operator=(PlainImage&&) noexcept = default;
 PlainImage::~PlainImage() = default;
 
-bool readPlainFile(const RandomAccessFile& file, unsigned int maxLength, PlainImage& image)
+bool readPlainFile(PlainSource& file, unsigned int maxLength, PlainImage& image)
 {
     return isParserAsUsual() && PlainReader(file).read(maxLength, image);
 }

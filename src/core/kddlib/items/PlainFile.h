@@ -1,7 +1,5 @@
 #pragma once
 
-#include "platform/os/RandomAccessFile.h"
-
 #include <QtGlobal>
 
 #include <memory>
@@ -9,6 +7,7 @@
 namespace Kdd
 {
 
+class PlainSource;
 class TagMap;
 
 /// What a DICOM file says of its image.
@@ -30,6 +29,6 @@ struct PlainImage
 /// That parser makes an object of every element and asks a dictionary behind a lock for each, which takes ten times
 /// as long as to read it and keeps threads waiting for each other. Long values are passed over unread. Nothing is
 /// logged; may be called on any thread.
-bool readPlainFile(const RandomAccessFile& file, unsigned int maxLength, PlainImage& image);
+bool readPlainFile(PlainSource& file, unsigned int maxLength, PlainImage& image);
 
 }  // namespace Kdd

@@ -1,5 +1,6 @@
 #include "kddlib/items/PlainFiles.h"
 
+#include "kddlib/items/PlainSource.h"
 #include "kddlib/tagmodel/TagMap.h"
 
 #include <utility>
@@ -20,7 +21,8 @@ PlainRead readOpen(const RandomAccessFile& file, unsigned int maxLength)
 {
     PlainRead read;
     read.identity = file.identity();
-    read.isPlain = readPlainFile(file, maxLength, read.image);
+    LocalSource source(file);
+    read.isPlain = readPlainFile(source, maxLength, read.image);
     return read;
 }
 

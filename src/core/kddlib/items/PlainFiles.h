@@ -2,6 +2,7 @@
 
 #include "kddlib/items/PlainFile.h"
 #include "platform/base/OrderedWork.h"
+#include "platform/os/RandomAccessFile.h"
 
 #include <QByteArray>
 #include <QList>
