@@ -137,7 +137,7 @@ TEST_F(Remote, ObjectsThatChangeOrGoAreToldAndTheRestIsTaken)
     EXPECT_FALSE((added.err + added.out).contains("secret"));
     mUrls = mUrls.mid(1, 4);
     writeList();
-    save("1", anImage("1").with(DCM_PatientName, "Roe^R").withLong(DCM_TextValue, 3000));
+    save("1", anImage("1").with(DCM_PatientName, "Roe^Richard").withLong(DCM_TextValue, 3000));
     mServer.addFile("1", bytes("1"));
     const Answer changed = addList();
     EXPECT_EQ(changed.number("unchanged"), 3);
