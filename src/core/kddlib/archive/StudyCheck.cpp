@@ -34,13 +34,6 @@ QString textOf(const QByteArray& bytes)
     return pathText(shownAddress(bytes));
 }
 
-LoadedHeader loadHeader(const QByteArray& path)
-{
-    LoadedHeader loaded{std::make_unique<DcmFileFormat>(), {}};
-    loaded.condition = loadDicomHeader(path, *loaded.format);
-    return loaded;
-}
-
 /// Why a study's tag file cannot be read, more plainly than the reader can tell.
 QString reasonOf(const QString& path, const TagFile& tried)
 {
@@ -148,7 +141,10 @@ void StudyCheck::checkImages(const TagFile& file)
     qint64 done = 0;
     for (auto it = images.cbegin(); it != images.cend() && !mObserver.isCancelled(); ++it) {
         const QByteArray path = filePathOf(*it.value());
-        checkImage(it.key(), *it.value(), isObjectAddress(path) ? ahead.next() : loadHeader(path));
+        if (isObjectAddress(path))
+            checkLoaded(it.key(), *it.value(), ahead.next());
+        else
+            checkImage(it.key(), *it.value());
         mObserver.progress(++done, images.size());
     }
 }
@@ -234,7 +230,14 @@ void StudyCheck::checkPreviews(const QByteArray& studyUID, const TagFile& file)
                   .arg(missing));
 }
 
-void StudyCheck::checkImage(const QByteArray& key, const TagMap& image, LoadedHeader loaded)
+void StudyCheck::checkImage(const QByteArray& key, const TagMap& image)
+{
+    LoadedHeader loaded{std::make_unique<DcmFileFormat>(), {}};
+    loaded.condition = loadDicomHeader(filePathOf(image), *loaded.format);
+    checkLoaded(key, image, loaded);
+}
+
+void StudyCheck::checkLoaded(const QByteArray& key, const TagMap& image, const LoadedHeader& loaded)
 {
     const QByteArray path = filePathOf(image);
     if (loaded.condition.bad()) {

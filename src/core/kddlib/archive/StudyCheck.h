@@ -56,7 +56,8 @@ private:
     void checkVolumes(const QByteArray& studyUID, const TagFile& file);
     void checkPreviews(const QByteArray& studyUID, const TagFile& file);
     void checkImages(const TagFile& file);
-    void checkImage(const QByteArray& key, const TagMap& image, LoadedHeader loaded);
+    void checkImage(const QByteArray& key, const TagMap& image);
+    void checkLoaded(const QByteArray& key, const TagMap& image, const LoadedHeader& loaded);
     void checkUnknown(const QString& path);
 
     Kxg::Catalogue& mCatalogue;
