@@ -57,13 +57,22 @@ class Sender(threading.Thread):
         head = (b"POST %s/studies HTTP/1.1\r\nHost: 127.0.0.1:%d\r\nAccept: application/dicom+json\r\n"
                 b'Content-Type: multipart/related; type="application/dicom"; boundary=%s\r\nContent-Length: %d\r\n\r\n'
                 % (self.server.prefix.encode(), self.server.port, BOUNDARY, sum(len(each) for each in pieces)))
-        link.sendall(head)
-        for piece in pieces:
-            link.sendall(piece)
+        send_all(link, [head] + pieces)
         answer = http.client.HTTPResponse(link, method="POST")
         answer.begin()
         told = json.loads(answer.read())
         self.stored += len(told.get("00081199", {}).get("Value", []))
+
+
+def send_all(link, pieces):
+    """In as few calls as it takes: the sender's time is taken from the server's, on the same processors."""
+    pieces = [memoryview(piece) for piece in pieces]
+    while pieces:
+        sent = link.sendmsg(pieces[:512])
+        while pieces and sent >= len(pieces[0]):
+            sent -= len(pieces.pop(0))
+        if sent:
+            pieces[0] = pieces[0][sent:]
 
 
 def ask(server, path):

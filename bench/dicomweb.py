@@ -181,7 +181,7 @@ def main():
                 ratios = ["", ""]
                 if len(results) == 2:
                     ratios[0] = "%.0f" % (found["cpu"] / results[0]["cpu"])
-                    if found["rates"]:
+                    if found["rates"] and results[0]["rates"]:
                         ratios[1] = "%.1f" % (results[0]["rates"][1] / found["rates"][1] if found["rates"][1] else 0)
                 rates = ["%.1f" % each for each in found["rates"]] or ["", ""]
                 print("| %s | %s | %d | %.2f | %.3f | %s |" % (row["name"], server.name, found["bytes"], found["wall"],

@@ -41,7 +41,7 @@ int timeOf(char* argv[])
     posix_spawn_file_actions_destroy(&actions);
     std::printf("%.3f %.3f %ld %d\n", wall.count(),
                 millisecondsOf(usage.ru_utime) + millisecondsOf(usage.ru_stime), usage.ru_maxrss,
-                WIFEXITED(status) ? WEXITSTATUS(status) : -1);
+                WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status));
     return 0;
 }
 

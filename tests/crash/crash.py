@@ -35,7 +35,8 @@ FAULTS.update(dict.fromkeys("fsync fdatasync rename unlink".split(), ["EIO"]))
 JOB = """<Job><Timestamp>20240131120000</Timestamp><Login>anna</Login><Substitutions%s>
 <Tag Group='%s' Element='%s'><Value>%s</Value></Tag></Substitutions></Job>"""
 
-Operation = collections.namedtuple("Operation", "name before command")
+# Undisturbed it ends with `code`.
+Operation = collections.namedtuple("Operation", "name before command code", defaults=[0])
 OPERATIONS = [
     Operation("first", [], "add DAY"),
     Operation("add", ["index NOTHING"], "add DAY"),
@@ -51,7 +52,7 @@ OPERATIONS = [
     Operation("image", ["add DAY"], "delete STUDY --image IMAGE"),
     Operation("study", ["add DAY"], "delete STUDY"),
     Operation("replace", ["add DAY", "CHANGE"], "add DAY"),
-    Operation("vanish", ["add DAY", "REMOVE"], "build --all"),
+    Operation("vanish", ["add DAY", "REMOVE"], "build --all --again", 1),
 ]
 
 
@@ -68,12 +69,13 @@ class Site:
             self.postgres, address = start_postgres(folder)
             self.admin = address.replace("/kdd?", "/postgres?")
         self.environment = dict(os.environ, KDD_STORE=self.store, KDD_DATABASE=address, KDD_SETTLE_SECONDS="0",
-                                KDD_PREVIEWS="0", LC_ALL="C.UTF-8")
+                                LC_ALL="C.UTF-8")
         self.original = os.path.join(folder, "original")
         self.run("sample", os.path.join(folder, "sample"), "--images", "6", "--seed", "5", "--quiet")
         for study in ("CT-1", "MR-1"):
             shutil.copytree(os.path.join(folder, "sample", study), os.path.join(self.original, study))
-        self.words = {"DAY": self.day, "FIRST": os.path.join(self.day, "CT-1/2")}
+        self.words = {"DAY": self.day, "FIRST": os.path.join(self.day, "CT-1/2"), "NOTHING": os.path.join(folder, "nothing")}
+        os.mkdir(self.words["NOTHING"])
         self.restore_files()
         self.run("add", self.day, "--quiet")
         (ct, images), (mr, _) = [(each["study"], json.loads(self.run("metadata", each["study"]).stdout)) for each in sorted(
@@ -108,8 +110,8 @@ class Site:
                 self.change_file()
             elif command == "REMOVE":
                 os.unlink(self.some_file())
-            else:
-                self.run(*self.arguments(command))
+            elif self.run(*self.arguments(command)).returncode != 0:
+                raise SystemExit(f"{operation.name} cannot begin: {command} fails")
         shutil.rmtree(self.kept, ignore_errors=True)
         os.makedirs(self.store, exist_ok=True)
         shutil.copytree(self.store, self.kept)
@@ -182,6 +184,8 @@ class Attack:
         site.begin(operation)
         self.before = site.images()
         self.calls = self.count_calls()
+        if self.code != operation.code:
+            raise SystemExit(f"{operation.name} ends with {self.code} when nothing disturbs it")
         self.after = site.images()
         self.again_code = site.run(*self.arguments).returncode
         self.whole = site.heal()

@@ -12,13 +12,12 @@ using namespace Kdd;
 namespace
 {
 
-/// Every C++ source below src by its path.
-std::map<QString, QString> sources()
+/// Every C++ source below the folder by its path.
+std::map<QString, QString> sources(const QString& folder = QStringLiteral("src"))
 {
     std::map<QString, QString> texts;
     const QDir root(QStringLiteral(KDD_SOURCES));
-    for (QDirIterator it(root.filePath(QStringLiteral("src")),
-                         {QStringLiteral("*.h"), QStringLiteral("*.cpp")}, QDir::Files,
+    for (QDirIterator it(root.filePath(folder), {QStringLiteral("*.h"), QStringLiteral("*.cpp")}, QDir::Files,
                          QDirIterator::Subdirectories);
          it.hasNext();) {
         const QString path = root.relativeFilePath(it.next());
@@ -78,6 +77,26 @@ TEST(ThreadsPage, TellsOfEveryClassThatIsExportedAndSoDoesItsHeader)
     for (const std::string& cell : matches(pageText(QStringLiteral("docs/threads.md")), "^\\| (`[^|]+) \\|"))
         told.merge(matches(QString::fromStdString(cell), "`([\\w:]+)`"));
     EXPECT_EQ(told, exported);
+}
+
+TEST(ThreatsPage, NamesForEachThreatATestThatIsThere)
+{
+    std::set<std::string> there;
+    for (const auto& [path, text] : sources(QStringLiteral("tests"))) {
+        for (std::string name : matches(text, "^TEST(?:_F|_P)?\\((\\w+),\\s+(\\w+)\\)")) {
+            name[name.find(' ')] = '.';
+            there.insert(name);
+        }
+    }
+    const QString page = pageText(QStringLiteral("docs/threats.md"));
+    std::set<std::string> missing;
+    for (const std::string& named : matches(page, "`(\\w+\\.\\w+)`")) {
+        if (there.count(named) == 0)
+            missing.insert(named);
+    }
+    EXPECT_EQ(missing, std::set<std::string>());
+    EXPECT_EQ(matches(page, "^(\\| [^*`|]+ \\| [^|]+ \\|) [^`|]*\\|$"),
+              std::set<std::string>{"| threat | what stands against it |"});
 }
 
 }  // namespace

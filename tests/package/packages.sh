@@ -1,8 +1,8 @@
 #!/usr/bin/env bash
 # Makes the packages of a build, looks into them, and unpacks them into a folder as if that were the root of a machine.
-# usage: packages.sh CPACK BUILD_FOLDER FOLDER
+# usage: packages.sh CPACK BUILD_FOLDER FOLDER MATERIALS
 set -euo pipefail
-cpack=$1 build=$2 folder=$3
+cpack=$1 build=$2 folder=$3 materials=$4
 root=$folder/root
 
 fail() { echo "$*" >&2; exit 1; }
@@ -62,7 +62,18 @@ headers=$root/usr/include/kddlib
 ! grep -rn '#include "' "$headers" || fail "An installed header names a folder of the source"
 ! grep -rIl "$build" "$root/usr" || fail "These know where they were built"
 for file in "$root"/usr/bin/kdd "$root"/usr/lib/*/libkdd.so.0 "$root"/usr/lib/*/kddlib/*.so; do
+    readelf -dW "$file" | grep -q BIND_NOW || fail "$file resolves names after its start"
     ! readelf -d "$file" | grep -E 'R(UN)?PATH' | grep -v '\[\$ORIGIN/' || fail "$file looks for libraries elsewhere"
+done
+
+for file in "$root"/usr/bin/kdd "$root"/usr/lib/*/libkdd.so.0; do
+    readelf --dyn-syms -W "$file" | grep -q __stack_chk_fail || fail "$file does not watch its stack"
+done
+
+"$materials" "$build" >"$folder/materials.json"
+for name in libavcodec59 libdcmtk17 libhdf5-103-1 libqt5core5a libssl3; do
+    grep -A1 "\"name\": \"$name\"" "$folder/materials.json" | grep -q '"version": "[0-9]' ||
+        fail "The bill of materials does not tell the version of $name"
 done
 
 "$root/usr/bin/kdd" --version

@@ -159,7 +159,7 @@ TEST_F(CommandLine, AUniqueBeginningNamesAStudy)
 
 TEST_F(CommandLine, WrongUsageIsToldFromFailure)
 {
-    for (const char* arguments : {"", "frobnicate", "add", "verify", "verify --all 1.2",
+    for (const char* arguments : {"", "frobnicate", "add", "verify", "verify --all 1.2", "build --again",
                                   "--compression zip list", "list --no-such", "qa job.xml --image 1"})
         EXPECT_EQ(kdd(arguments).exitCode, 2) << arguments;
     for (const char* command : {"list", "verify --all", "build --all", "stack", "previews --all pictures"})

@@ -248,7 +248,7 @@ SystemResult reserveOrUndo(int fd, const QString& path, off_t formerSize, int ne
     if (error == 0)
         return {};
     // Some of the room may have been added already. Should the cut fail, there are zeros behind the old content.
-    static_cast<void>(::ftruncate(fd, formerSize));
+    [[maybe_unused]] const int cut = ::ftruncate(fd, formerSize);
     removeJournal(path);
     return failed("reserve room for", path, error);
 }

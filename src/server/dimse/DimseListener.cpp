@@ -336,7 +336,7 @@ void DimseListener::stop()
         return;
     const quint64 one = 1;
     // Fails when it was written to before.
-    static_cast<void>(::write(d->stopped.number(), &one, sizeof one));
+    [[maybe_unused]] const ssize_t written = ::write(d->stopped.number(), &one, sizeof one);
     d->acceptor.join();
     {
         std::unique_lock<std::mutex> lock(d->mutex);

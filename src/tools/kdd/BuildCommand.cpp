@@ -119,6 +119,10 @@ Outcome runBuild(const GlobalOptions& options, const BuildRequest& request)
         LogFile::errorf("Name the studies to build, or --all or --restored");
         return Outcome::WrongUsage;
     }
+    if (request.again && !isEverything && request.selection.studies.isEmpty()) {
+        LogFile::errorf("--again builds what is named once more: name studies, or --all");
+        return Outcome::WrongUsage;
+    }
     // An archive that is not there has nothing to build, so none is made.
     const std::unique_ptr<Kxg::Catalogue> database = openExistingDatabase();
     QVector<QByteArray> named;

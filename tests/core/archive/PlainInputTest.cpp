@@ -33,9 +33,11 @@ bool isPlain(const QString& path)
     DicomInput plain;
     if (!takePlain(name, readPlain(name, kDefaultValueBound), plain))
         return false;
-    DcmFileFormat format;
     const LogCapture log;
-    EXPECT_EQ(textOf(plain), textOf(readDicomInput(name, Damage::Refused, format))) << name.constData();
+    DicomInput ahead;
+    EXPECT_TRUE(takePlain(name, PlainFiles({name}, 1, kDefaultValueBound).next(), ahead));
+    EXPECT_EQ(textOf(plain), textOf(ahead)) << name.constData();
+    EXPECT_EQ(textOf(plain), textOf(parseInput(name, Damage::Refused))) << name.constData();
     EXPECT_TRUE(log.lines().empty()) << "of what is plain nothing is to be told";
     return true;
 }
@@ -173,6 +175,26 @@ TEST_F(PlainInputFile, CountsFragmentsAndPassesOverThem)
         putFile(path(), whole.chopped(cut));
         EXPECT_FALSE(isPlain(path())) << cut;
     }
+}
+
+/// What lies behind its head is read later.
+TEST_F(PlainInputFile, IsOfOneStateOfItsFile)
+{
+    const QByteArray description(20000, 'x');
+    DatasetBuilder image = anImage("1.2");
+    image.with(privateValue(0x1001, description)).bytes({1, 2}, DCM_PixelData);
+    const QByteArray whole = fileContent(save(image, EXS_LittleEndianExplicit, EET_ExplicitLength));
+    const QByteArray name = path().toLocal8Bit();
+    FileHeads heads;
+    heads.fetch({name, name + "absent"}, 0, 2);
+    EXPECT_EQ(heads.source(1), nullptr);
+    PlainImage taken;
+    EXPECT_TRUE(readPlainFile(*heads.source(0), kDefaultValueBound, taken));
+    EXPECT_EQ(heads.identity(0).size, whole.size());
+    QFile::remove(path());
+    EXPECT_FALSE(readPlainFile(*heads.source(0), kDefaultValueBound, taken));
+    putFile(path(), whole);
+    EXPECT_FALSE(readPlainFile(*heads.source(0), kDefaultValueBound, taken));
 }
 
 /// What a program told the parser counts.

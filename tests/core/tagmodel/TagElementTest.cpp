@@ -197,6 +197,11 @@ TEST(VrCode, NumbersAreThoseThatTagFilesHold)
     }
     for (const DcmEVR evr : {EVR_UN, EVR_OD, EVR_OL, EVR_OV, EVR_SV, EVR_UV, EVR_UNKNOWN, EVR_UNKNOWN2B})
         EXPECT_EQ(static_cast<int>(vrCodeOf(evr)), 40);
+    // Of every other code the VR is known without a look into the dictionary.
+    for (int number = EVR_AE; number <= EVR_UNKNOWN2B; ++number) {
+        const auto evr = static_cast<DcmEVR>(number);
+        EXPECT_TRUE(evrOf(vrCodeOf(evr)) == evr || hasSeveralVrs(vrCodeOf(evr))) << number;
+    }
     for (const quint32 none : {44U, 63U, 254U, 255U, 0xffffffffU})
         EXPECT_STREQ(vrName(static_cast<VrCode>(none)), "??");
 }

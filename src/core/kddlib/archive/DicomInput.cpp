@@ -134,11 +134,10 @@ DicomInput readDicomInput(const QByteArray& path, Damage damage)
     DicomInput plain;
     if (takePlain(path, readPlain(path, kDefaultValueBound), plain))
         return plain;
-    DcmFileFormat format;
-    return readDicomInput(path, damage, format);
+    return parseInput(path, damage);
 }
 
-DicomInput readDicomInput(const QByteArray& path, Damage damage, DcmFileFormat& format)
+DicomInput parseInput(const QByteArray& path, Damage damage)
 {
     DicomInput input;
     input.path = path;
@@ -164,6 +163,7 @@ DicomInput readDicomInput(const QByteArray& path, Damage damage, DcmFileFormat& 
         return input;
     }
     const bool isDicom = hasDicomPrefix(file);
+    DcmFileFormat format;
     const OFCondition condition = damage == Damage::Refused
                                       ? readDicomFile(path.constData(), format)
                                       : readDamagedDicomFile(path.constData(), format, input.leftOut);

@@ -8,8 +8,6 @@
 
 #include <memory>
 
-class DcmFileFormat;
-
 namespace Kdd
 {
 
@@ -56,8 +54,5 @@ enum class Damage { Refused, Tolerated };
 /// DICOM: they describe files, not patients. An object that names no study or series is unusable. May be called on
 /// several threads at once.
 KDD_EXPORT DicomInput readDicomInput(const QByteArray& path, Damage damage);
-
-/// The same; `file` has what was read afterwards, also when that was not all.
-KDD_EXPORT DicomInput readDicomInput(const QByteArray& path, Damage damage, DcmFileFormat& file);
 
 }  // namespace Kdd

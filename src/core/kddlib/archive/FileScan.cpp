@@ -9,10 +9,6 @@
 #include "platform/base/LogFile.h"
 #include "platform/os/FileStatus.h"
 
-#include <dcmtk/config/osconfig.h>
-
-#include <dcmtk/dcmdata/dcfilefo.h>
-
 #include <algorithm>
 
 namespace Kdd
@@ -53,10 +49,8 @@ Result FileScan::takeNext(const QByteArray& file, PlainFiles& ahead,
                           const std::function<Result(DicomInput)>& take)
 {
     DicomInput input;
-    if (!takePlain(file, ahead.next(), input)) {
-        DcmFileFormat format;
-        input = readDicomInput(file, mDamage, format);
-    }
+    if (!takePlain(file, ahead.next(), input))
+        input = parseInput(file, mDamage);
     return handOn(std::move(input), take);
 }
 

@@ -17,6 +17,7 @@ namespace Kdd
 
 class OrlanMesh;
 class Result;
+enum class Damage;
 struct DicomInput;
 
 /// Turns what was read of the file at the path into what `readDicomInput` makes of it. False, with `input` as it was,
@@ -28,5 +29,8 @@ void takeParsed(DicomInput& input, bool hasPrefix, const OFCondition& condition,
 
 /// Says in `input` what a volume file is; `mesh` is null when it cannot be read, as `result` says.
 void takeVolume(DicomInput& input, const std::unique_ptr<OrlanMesh>& mesh, const Result& result);
+
+/// What `readDicomInput` makes of a file of whatever form, by DCMTK's parser.
+DicomInput parseInput(const QByteArray& path, Damage damage);
 
 }  // namespace Kdd

@@ -1,6 +1,5 @@
 #include "kddlib/items/PlainFiles.h"
 
-#include "kddlib/items/PlainSource.h"
 #include "kddlib/tagmodel/TagMap.h"
 
 #include <utility>
@@ -8,66 +7,48 @@
 namespace Kdd
 {
 
-namespace
+PlainRead readPlain(const QByteArray& path, unsigned int maxLength)
 {
-
-/// Opened at once by each thread.
-constexpr int kFilesAtOnce = 8;
-
-/// Most headers fit into it whole.
-constexpr qint64 kHead = 16 * 1024;
-
-PlainRead readOpen(const RandomAccessFile& file, unsigned int maxLength)
-{
+    RandomAccessFile file;
     PlainRead read;
+    if (file.open(path.constData()).bad())
+        return read;
     read.identity = file.identity();
     LocalSource source(file);
     read.isPlain = readPlainFile(source, maxLength, read.image);
     return read;
 }
 
-}  // namespace
-
-PlainRead readPlain(const QByteArray& path, unsigned int maxLength)
-{
-    RandomAccessFile file;
-    return file.open(path.constData()).good() ? readOpen(file, maxLength) : PlainRead();
-}
-
 PlainFiles::PlainFiles(QList<QByteArray> paths, int threads, unsigned int maxLength)
     : mPaths(std::move(paths))
     , mMaxLength(maxLength)
-    , mWork((mPaths.size() + kFilesAtOnce - 1) / kFilesAtOnce, threads,
-            [this](int number) { return readPortion(number); })
+    , mWork((mPaths.size() + FileHeads::kFiles - 1) / FileHeads::kFiles, threads,
+            [this](int portion) { return fetch(portion); })
 {
 }
 
 PlainRead PlainFiles::next()
 {
-    if (mNext == mPortion.size()) {
-        mPortion = mWork.next();
-        mNext = 0;
+    const int i = mNext++ % FileHeads::kFiles;
+    if (i == 0) {
+        if (mHeads != nullptr)
+            mSpare.give(std::move(mHeads));
+        mHeads = mWork.next();
     }
-    return std::move(mPortion.at(mNext++));
+    PlainRead read;
+    if (const std::unique_ptr<PlainSource> source = mHeads->source(i)) {
+        read.identity = mHeads->identity(i);
+        read.isPlain = readPlainFile(*source, mMaxLength, read.image);
+    }
+    return read;
 }
 
-PlainFiles::Portion PlainFiles::readPortion(int number) const
+std::unique_ptr<FileHeads> PlainFiles::fetch(int portion)
 {
-    const int first = number * kFilesAtOnce;
-    const int count = qMin(kFilesAtOnce, mPaths.size() - first);
-    RandomAccessFile files[kFilesAtOnce];
-    bool isOpen[kFilesAtOnce] = {};
-    for (int i = 0; i < count; ++i) {
-        isOpen[i] = files[i].open(mPaths.at(first + i).constData()).good();
-        if (isOpen[i])
-            files[i].askFor(0, kHead);
-    }
-    Portion portion(static_cast<std::size_t>(count));
-    for (int i = 0; i < count; ++i) {
-        if (isOpen[i])
-            portion[static_cast<std::size_t>(i)] = readOpen(files[i], mMaxLength);
-    }
-    return portion;
+    std::unique_ptr<FileHeads> heads = mSpare.take();
+    const int first = portion * FileHeads::kFiles;
+    heads->fetch(mPaths, first, qMin(FileHeads::kFiles, mPaths.size() - first));
+    return heads;
 }
 
 }  // namespace Kdd

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "kddlib/items/FileHeads.h"
 #include "kddlib/items/PlainFile.h"
 #include "platform/base/OrderedWork.h"
 #include "platform/os/RandomAccessFile.h"
@@ -7,7 +8,7 @@
 #include <QByteArray>
 #include <QList>
 
-#include <vector>
+#include <memory>
 
 namespace Kdd
 {
@@ -23,8 +24,9 @@ struct PlainRead
 /// The same for one file.
 PlainRead readPlain(const QByteArray& path, unsigned int maxLength);
 
-/// Reads files one after the other, on several threads ahead of being asked for. The heads of the next few are asked for
-/// before one is read, so that a disk or a server far away works on several at a time. Used by one thread.
+/// Reads files one after the other, their heads on several threads ahead of being asked for. Images are made of them by the
+/// thread that asks: memory that one thread takes and another gives back, piece by piece, costs both more than the making.
+/// Used by one thread.
 class PlainFiles
 {
 public:
@@ -35,15 +37,14 @@ public:
     PlainRead next();
 
 private:
-    using Portion = std::vector<PlainRead>;
-
-    Portion readPortion(int number) const;
+    std::unique_ptr<FileHeads> fetch(int portion);
 
     const QList<QByteArray> mPaths;
     const unsigned int mMaxLength;
-    Portion mPortion;
-    std::size_t mNext = 0;       // in the portion
-    OrderedWork<Portion> mWork;  // last, because its threads use the rest
+    std::unique_ptr<FileHeads> mHeads;
+    int mNext = 0;  // of all files
+    SpareHeads mSpare;
+    OrderedWork<std::unique_ptr<FileHeads>> mWork;  // last, because its threads use the rest
 };
 
 }  // namespace Kdd

@@ -58,6 +58,11 @@ DcmEVR evrOf(VrCode code)
     return number < std::size(kEvrByCode) ? kEvrByCode[number] : EVR_UNKNOWN;
 }
 
+bool hasSeveralVrs(VrCode code)
+{
+    return code == VrCode::UT || code == VrCode::Ox || code == VrCode::UN;
+}
+
 const char* vrName(VrCode code)
 {
     // DcmVR knows the names of static storage only, so the pointer outlives the object.

@@ -66,6 +66,9 @@ KDD_EXPORT VrCode vrCodeOf(DcmEVR evr);
 /// DCMTK's VR of a code; EVR_UNKNOWN for the omitted marker and for numbers that are no code.
 KDD_EXPORT DcmEVR evrOf(VrCode code);
 
+/// Whether DCMTK's VRs of values with that code differ, so that `evrOf` is one of several.
+KDD_EXPORT bool hasSeveralVrs(VrCode code);
+
 /// DCMTK's name of the VR ("PN", "ox", ...), and its name for an unknown one ("??").
 KDD_EXPORT const char* vrName(VrCode code);
 
