@@ -51,7 +51,8 @@ QByteArray shownAddress(const QByteArray& name)
     if (query >= 0)
         shown = shown.left(query + 1) + shownQuery(shown.mid(query + 1));
     const int host = shown.indexOf("//") + 2;
-    const auto end = std::find_if(shown.cbegin() + host, shown.cend(), [](char c) { return c == '/' || c == '?'; });
+    const auto end =
+        std::find_if(shown.cbegin() + host, shown.cend(), [](char c) { return c == '/' || c == '?'; });
     // The last one, for a password may have one in it.
     const int at = shown.left(static_cast<int>(end - shown.cbegin())).lastIndexOf('@');
     if (at >= host)
