@@ -48,6 +48,7 @@ set(KDD_PUBLIC_HEADERS
   core/kddlib/net/http/CurlError.h
   core/kddlib/net/http/KxCurlDownloadStream.h
   core/kddlib/net/http/KxHttpStatus.h
+  core/kddlib/net/http/ObjectAddress.h
   core/kddlib/net/http/ObjectVersion.h
   core/kddlib/previews/PreviewGenerator.h
   core/kddlib/previews/QuadrantNavigation.h

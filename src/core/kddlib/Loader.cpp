@@ -7,6 +7,7 @@
 #include "kddlib/net/dicom/DicomFileReader.h"
 #include "kddlib/net/dicom/KxDcmFileLoader.h"
 #include "kddlib/net/http/KxCurlDownloadStream.h"
+#include "kddlib/net/http/ObjectAddress.h"
 #include "kddlib/tagfile/TagFile.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
@@ -43,7 +44,7 @@ std::shared_ptr<Item> loadWholeFile(const char* path)
     const OFCondition condition = loadDicomFile(path, file);
     if (condition.good())
         return itemOf(file);
-    LogFile::errorf("Could not load %s: %s", path, condition.text());
+    LogFile::errorf("Could not load %s: %s", shownAddress(path).constData(), condition.text());
     return nullptr;
 }
 
@@ -80,7 +81,8 @@ bool readBeginning(const char* path, int size, QByteArray& bytes)
     std::string reason;
     const qint64 count = readFirst(path, bytes, reason);
     if (count < 0)
-        LogFile::errorf("Could not open %s%s%s", path, reason.empty() ? "" : ": ", reason.c_str());
+        LogFile::errorf("Could not open %s%s%s", shownAddress(path).constData(), reason.empty() ? "" : ": ",
+                        reason.c_str());
     else if (count != size)
         LogFile::errorf("%s: Could only read %d of %d bytes", path, static_cast<int>(count), size);
     return count == size;

@@ -1,6 +1,7 @@
 #include "kddlib/StudySources.h"
 
 #include "kddlib/net/dicom/LocalFiles.h"
+#include "kddlib/net/http/ObjectAddress.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
@@ -54,8 +55,13 @@ std::unique_ptr<TagMap> ImagesByPath::copy(const std::string& path) const
     return copy;
 }
 
-std::unique_ptr<TagMap> ImagesAhead::take(const QByteArray& path)
+std::unique_ptr<TagMap> ImagesAhead::take(const QByteArray& path, ObjectRead& object)
 {
+    if (!mUrls.isEmpty() && mUrls.first() == path) {
+        mUrls.removeFirst();
+        object = mObjects.next();
+        return object.isPlain ? std::move(object.image.map) : nullptr;
+    }
     if (mPaths.isEmpty() || mPaths.first() != path)
         return nullptr;
     mPaths.removeFirst();
@@ -66,12 +72,17 @@ std::unique_ptr<TagMap> ImagesAhead::take(const QByteArray& path)
 ImagesAhead StudySources::readAhead(int threads) const
 {
     QList<QByteArray> paths;
+    QList<QByteArray> urls;
     for (const std::string& path : dicomFiles) {
         const QByteArray name = QByteArray::fromStdString(path);
-        if (!adopted->undecided().contains(name) && !loaded.contains(name) && isReadLocally(path.c_str()))
+        if (adopted->undecided().contains(name) || loaded.contains(name))
+            continue;
+        if (isObjectAddress(name))
+            urls.append(name);
+        else if (isReadLocally(path.c_str()))
             paths.append(name);
     }
-    return {paths, threads};
+    return {paths, urls, threads};
 }
 
 bool StudySources::query(const QByteArray& user, int studyId)

@@ -2,6 +2,7 @@
 
 #include "kddlib/Limits.h"
 #include "kddlib/items/PlainFiles.h"
+#include "kddlib/items/PlainObjects.h"
 #include "kddlib/tagfile/TagFile.h"
 #include "kddlib/tagfile/qa/AdoptedCorrections.h"
 #include "kddlib/tagfile/qa/BuildCorrections.h"
@@ -57,19 +58,23 @@ class ImagesAhead
 {
 public:
     /// `threads` as in `ThreadShare`.
-    ImagesAhead(const QList<QByteArray>& paths, int threads)
+    ImagesAhead(const QList<QByteArray>& paths, const QList<QByteArray>& urls, int threads)
         : mPaths(paths)
+        , mUrls(urls)
         , mFiles(paths, threads, kDefaultValueBound)
+        , mObjects(urls, {}, kDefaultValueBound)
     {
     }
 
-    /// The image of a file; null when that is not the next one or has to be loaded otherwise. Asked for in the order of
-    /// the paths.
-    std::unique_ptr<TagMap> take(const QByteArray& path);
+    /// The image of a file; null when that is not the next one or has to be loaded otherwise. `object` has then what else
+    /// was found out of one behind a URL. Asked for in the order of the paths, and of the URLs.
+    std::unique_ptr<TagMap> take(const QByteArray& path, ObjectRead& object);
 
 private:
     QList<QByteArray> mPaths;  // that were not taken
+    QList<QByteArray> mUrls;   // likewise
     PlainFiles mFiles;
+    PlainObjects mObjects;
 };
 
 /// What a study is built from.

@@ -4,7 +4,9 @@
 #include "kddlib/StudySources.h"
 #include "kddlib/net/KxCurlClient.h"
 #include "kddlib/net/dicom/KxDcmFileLoader.h"
+#include "kddlib/net/dicom/RemoteDicom.h"
 #include "kddlib/net/http/KxHttpStatus.h"
+#include "kddlib/net/http/ObjectAddress.h"
 #include "kddlib/previews/PreviewGenerator.h"
 #include "kddlib/previews/QuadrantNavigation.h"
 #include "kddlib/tagfile/CorrectedVolumes.h"
@@ -58,13 +60,14 @@ bool download(const char* url, QByteArray& bytes)
     try {
         bytes = KxCurlClient::instance().readBytes(url, status);
     } catch (const std::exception& fault) {
-        LogFile::errorf("Reading %s failed: %s", url, fault.what());
+        LogFile::errorf("Reading %s failed: %s", shownAddress(url).constData(), fault.what());
         return false;
     }
     if (status.failed)
-        LogFile::errorf("Reading %s failed: %s", url, status.failure.c_str());
+        LogFile::errorf("Reading %s failed: %s", shownAddress(url).constData(), status.failure.c_str());
     else if (!status.ok())
-        LogFile::errorf("Reading %s failed: HTTP response code %d", url, status.code);
+        LogFile::errorf("Reading %s failed: HTTP response code %d", shownAddress(url).constData(),
+                        status.code);
     return status.ok();
 }
 
@@ -250,11 +253,11 @@ std::unique_ptr<TagMap> TagFileGenerator::readListed(const std::string& path, co
         return nullptr;
     // After the corrections, for one may have moved the image here from the study that its file names.
     if (studyInstanceUID != nullptr && image->uid(TagMap::StudyLevel) != studyInstanceUID) {
-        LogFile::warnf(kForeign, path.c_str(), studyInstanceUID);
+        LogFile::warnf(kForeign, shownAddress(name).constData(), studyInstanceUID);
         return nullptr;
     }
     if (!sources.isListed(*image, name)) {
-        LogFile::errorf("%s is not the image that was registered any more", path.c_str());
+        LogFile::errorf("%s is not the image that was registered any more", shownAddress(name).constData());
         return nullptr;
     }
     return image;
@@ -265,17 +268,24 @@ std::unique_ptr<TagMap> TagFileGenerator::load(const std::string& path, StudySou
                                                ImagesAhead& ahead)
 {
     const StopwatchSum::Running running(mLoadWatch);
-    if (std::unique_ptr<TagMap> image = ahead.take(QByteArray::fromStdString(path)))
+    const QByteArray name = QByteArray::fromStdString(path);
+    ObjectRead object;
+    if (std::unique_ptr<TagMap> image = ahead.take(name, object))
         return image;
     DcmFileFormat file;
-    const OFCondition condition = loadDicomFile(path.c_str(), file);
+    OFCondition condition = conditionOf(object.fault);
+    if (object.file != nullptr)
+        condition = readRemoteDicom(object.file, file);
+    else if (object.fault.good())
+        condition = loadDicomFile(path.c_str(), file);
     if (condition.bad()) {
-        LogFile::errorf("Could not open %s: %s", path.c_str(), condition.text());
+        LogFile::errorf("Could not open %s: %s", shownAddress(name).constData(), condition.text());
         return nullptr;
     }
     std::unique_ptr<TagMap> image(TagMap::createTagMap(file.getDataset(), kDefaultValueBound));
-    sources.datasets.keep(QByteArray::fromStdString(path),
-                          std::unique_ptr<DcmDataset>(file.getAndRemoveDataset()));
+    // One that comes by ranges keeps what was fetched last, and is not kept itself.
+    if (object.file == nullptr)
+        sources.datasets.keep(name, std::unique_ptr<DcmDataset>(file.getAndRemoveDataset()));
     return image;
 }
 
@@ -285,15 +295,17 @@ bool TagFileGenerator::addImage(TagFile& tagFile, std::unique_ptr<TagMap> image,
 {
     const bool isForeign = studyInstanceUID != nullptr && tagFile.isEmpty() &&
                            image->uid(TagMap::StudyLevel) != studyInstanceUID;
+    const QByteArray name = QByteArray::fromStdString(path);
     const int before = tagFile.imagesByUID().size();
-    if (isForeign || place(tagFile, std::move(image), QByteArray::fromStdString(path)) == nullptr) {
-        LogFile::warnf(kForeign, path.c_str(),
+    if (isForeign || place(tagFile, std::move(image), name) == nullptr) {
+        LogFile::warnf(kForeign, shownAddress(name).constData(),
                        studyInstanceUID != nullptr ? studyInstanceUID
                                                    : tagFile.studyInstanceUID().constData());
         return false;
     }
     if (tagFile.imagesByUID().size() == before)
-        LogFile::warnf("%s replaces another file of the same SOP Instance UID", path.c_str());
+        LogFile::warnf("%s replaces another file of the same SOP Instance UID",
+                       shownAddress(name).constData());
     return true;
 }
 
@@ -311,6 +323,8 @@ void TagFileGenerator::addPreviews(TagFile& tagFile, const QList<QByteArray>& ch
                                    const StudySources& sources)
 {
     const StopwatchSum::Running running(mPreviewWatch);
+    QList<TagMap*> images;
+    QList<QByteArray> urls;
     for (const QByteArray& sopUID : chosen) {
         TagMap* image = tagFile.findImage(sopUID);
         if (image == nullptr)
@@ -319,11 +333,32 @@ void TagFileGenerator::addPreviews(TagFile& tagFile, const QList<QByteArray>& ch
         // Its file could not be read before, so the preview that it brought along is the best there is.
         if (sources.kept.contains(path) && image->findElement(kPreview) != nullptr)
             continue;
-        if (DcmDataset* dataset = sources.datasets.find(path))
+        images.append(image);
+        if (isObjectAddress(path))
+            urls.append(path);
+    }
+    RemoteHeaders ahead(urls, kRemotePicture);
+    for (TagMap* image : qAsConst(images)) {
+        const QByteArray path = filePathOf(*image);
+        if (isObjectAddress(path))
+            addPreview(tagFile, *image, path, ahead.next());
+        else if (DcmDataset* dataset = sources.datasets.find(path))
             tagFile.addPreview(image, dataset, pathText(path));
         else
             tagFile.addPreview(image, path);
     }
+}
+
+/// Of many frames behind a URL the one that is shown is fetched.
+void TagFileGenerator::addPreview(TagFile& tagFile, TagMap& image, const QByteArray& url,
+                                  const LoadedHeader& loaded)
+{
+    const QByteArray shown = shownAddress(url);
+    if (loaded.condition.good())
+        tagFile.addPreview(&image, loaded.format->getDataset(), pathText(shown));
+    else
+        LogFile::warnf("Could not create preview image for DICOM file: %s (%s)", shown.constData(),
+                       loaded.condition.text());
 }
 
 void TagFileGenerator::addVolumeInfo(TagFile& tagFile, const std::vector<std::string>& volumeFiles)

@@ -18,6 +18,7 @@ class ImagesAhead;
 class OrlanMesh;
 class TagFile;
 class TagMap;
+struct LoadedHeader;
 struct StudySources;
 struct VolumeInfo;
 
@@ -103,6 +104,8 @@ private:
     static bool addImage(TagFile& tagFile, std::unique_ptr<TagMap> image, const std::string& path,
                          const char* studyInstanceUID);
     void addPreviews(TagFile& tagFile, const QList<QByteArray>& chosen, const StudySources& sources);
+    static void addPreview(TagFile& tagFile, TagMap& image, const QByteArray& url,
+                           const LoadedHeader& loaded);
     void addPreview(OrlanMesh& mesh, const char* path, VolumeInfo& info);
     void finishTree(TagFile& tagFile) const;
 

@@ -17,8 +17,12 @@ namespace Kdd
 class ThreadShare
 {
 public:
+    /// What the threads take: cores, or mostly patience, as those that wait for servers. The latter are not held against
+    /// the cores that others ask for.
+    enum class Of { Cores, Waiting };
+
     /// `wanted` threads; 0: as many as there are cores to spare, at least one and at most 16.
-    explicit ThreadShare(int wanted);
+    explicit ThreadShare(int wanted, Of of = Of::Cores);
     ~ThreadShare();
     ThreadShare(const ThreadShare&) = delete;
     ThreadShare& operator=(const ThreadShare&) = delete;
@@ -27,6 +31,7 @@ public:
 
 private:
     int mCount = 1;
+    int mCores = 0;  // of which others are told
 };
 
 /// Makes results on several threads and hands them on in their order, whichever is made first. The threads end with the
@@ -38,10 +43,11 @@ class OrderedWork
 public:
     /// `make(i)` is called for 0 <= i < `count` on any thread, once for each i and at most so far ahead of what was taken
     /// that each thread has two results waiting. `threads` as in `ThreadShare`.
-    OrderedWork(int count, int threads, std::function<Made(int)> make)
+    OrderedWork(int count, int threads, std::function<Made(int)> make,
+                ThreadShare::Of of = ThreadShare::Of::Cores)
         : mCount(count)
         , mMake(std::move(make))
-        , mShare(threads)
+        , mShare(threads, of)
     {
         for (int i = 1; i < mShare.count() && i < count; ++i)
             mHelpers.emplace_back([this] { help(); });

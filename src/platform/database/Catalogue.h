@@ -408,6 +408,9 @@ public:
     /// when another one has it.
     virtual Kdd::Result takeCheckTurn(std::unique_ptr<CheckTurn>& turn) = 0;
 
+    /// The stamps of those of the paths that are known.
+    virtual Kdd::Result stampsOf(const QList<QByteArray>& paths, QHash<QByteArray, FileStamp>& stamps) = 0;
+
 protected:
     Catalogue() = default;
 };

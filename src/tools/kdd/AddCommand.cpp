@@ -75,6 +75,10 @@ void report(const GlobalOptions& options, const FileScan& scan, const StudyIntak
 
 Outcome runAdd(const GlobalOptions& options, const ScanRequest& request)
 {
+    QList<QByteArray> paths;
+    Outcome outcome = Outcome::Done;
+    if (!request.collect(paths, outcome))
+        return outcome;
     const std::unique_ptr<Kxg::Catalogue> database = openDatabase();
     if (database == nullptr)
         return Outcome::Failed;
@@ -87,12 +91,12 @@ Outcome runAdd(const GlobalOptions& options, const ScanRequest& request)
     scan.setReaders(request.jobs);
     // Gathers what the scan hands on, so that a study is completed once for all its files.
     StudyIntake intake(*database, progress);
-    Result taken = scan.run(request.paths, [&](DicomInput input) { return intake.take(std::move(input)); });
+    Result taken = scan.run(paths, [&](DicomInput input) { return intake.take(std::move(input)); });
     if (taken.good())
         taken = intake.finish();
     // Unchanged files may be those of an earlier run that was ended before their studies were complete.
     if (taken.good() && scan.unchanged() > 0)
-        taken = intake.completeWaiting(request.paths);
+        taken = intake.completeWaiting(paths);
     const bool isDone = succeeded(taken);
     report(options, scan, intake);
     const QByteArray finished = QByteArray::number(intake.studies().size()) + " studies are complete";
@@ -110,7 +114,9 @@ void declareAdd(CommandSet& commands)
         "add", kTaking, "Take the DICOM and volume files below the paths into database and tag files",
         "What a server does when images arrive: every file that is new or changed is registered in the image "
         "database, and the tag file of each study that gained or lost one is built or completed. Files that "
-        "are neither DICOM nor volume files are passed over; --verbose names them.",
+        "are neither DICOM nor volume files are passed over; --verbose names them. Objects behind addresses "
+        "are "
+        "read by their headers, many at once, and stay where they are.",
         "kdd add day                            # a folder\n"
         "kdd --json add day/*/*                 # counts for a script\n"
         "kdd add --tolerant day --verbose       # also of damaged files what is sound"};

@@ -20,6 +20,10 @@ namespace
 /// The same scan as when images are taken in, but the studies are left waiting for others to build.
 Outcome runIndex(const GlobalOptions& options, const ScanRequest& request)
 {
+    QList<QByteArray> paths;
+    Outcome outcome = Outcome::Done;
+    if (!request.collect(paths, outcome))
+        return outcome;
     const std::unique_ptr<Kxg::Catalogue> database = openDatabase();
     if (database == nullptr)
         return Outcome::Failed;
@@ -31,8 +35,7 @@ Outcome runIndex(const GlobalOptions& options, const ScanRequest& request)
     scan.setDamage(request.tolerant ? Damage::Tolerated : Damage::Refused);
     scan.setReaders(request.jobs);
     Registration registration(*database);
-    Result registered =
-        scan.run(request.paths, [&](const DicomInput& input) { return registration.add(input); });
+    Result registered = scan.run(paths, [&](const DicomInput& input) { return registration.add(input); });
     // The last files are still held back, as registering is done for many at once.
     if (registered.good())
         registered = registration.flush();

@@ -9,11 +9,16 @@ namespace Kdd
 
 struct ScanRequest
 {
-    QList<QByteArray> paths;
-    bool tolerant = false;  ///< of damaged DICOM files take what is sound
-    int jobs = 0;           ///< files read at once; 0: as many as there are cores
+    QList<QByteArray> paths;  ///< files, folders and addresses of objects
+    QByteArray from;          ///< a file with a list of such; "-": standard input; empty: none
+    bool tolerant = false;    ///< of damaged DICOM files take what is sound
+    int jobs = 0;             ///< files read at once; 0: as many as there are cores
 
     void addTo(ArgumentList& arguments);
+
+    /// The paths, and behind them those of the list. False, with the reason logged and in `outcome`, when there are none
+    /// or the list cannot be read.
+    bool collect(QList<QByteArray>& all, Outcome& outcome) const;
 };
 
 struct StudySelection

@@ -3,6 +3,7 @@
 #include "kddlib/archive/FileScan.h"
 #include "kddlib/archive/FileWalk.h"
 #include "kddlib/archive/Registration.h"
+#include "kddlib/net/http/ObjectAddress.h"
 #include "kddlib/tagfile/StudyRecord.h"
 #include "kddlib/tagfile/TagFile.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
@@ -19,9 +20,10 @@ namespace Kdd
 namespace
 {
 
+/// An object behind a URL counts as there: whoever builds its study asks the server.
 bool isAbsent(const QByteArray& path)
 {
-    return presenceOf(pathText(path)) == FilePresence::Absent;
+    return !isObjectAddress(path) && presenceOf(pathText(path)) == FilePresence::Absent;
 }
 
 }  // namespace

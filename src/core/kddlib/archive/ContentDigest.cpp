@@ -1,5 +1,6 @@
 #include "kddlib/archive/ContentDigest.h"
 
+#include "kddlib/net/http/ObjectAddress.h"
 #include "platform/base/OrderedWork.h"
 #include "platform/late/LateLibrary.h"
 #include "platform/os/RandomAccessFile.h"
@@ -103,6 +104,9 @@ DigestedFile digestFile(const QByteArray& path, const BytesTaken& taken)
 
 Result digestRegistered(Kxg::Catalogue& catalogue, std::vector<Kxg::FileDigest> files)
 {
+    files.erase(std::remove_if(files.begin(), files.end(),
+                               [](const Kxg::FileDigest& file) { return isObjectAddress(file.path); }),
+                files.end());
     OrderedWork<QByteArray> work(static_cast<int>(files.size()), 0, [&files](int i) {
         const Kxg::FileDigest& file = files[static_cast<std::size_t>(i)];
         const DigestedFile read = digestFile(file.path);

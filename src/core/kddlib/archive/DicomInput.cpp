@@ -1,9 +1,11 @@
 #include "kddlib/archive/DicomInput.h"
 
 #include "kddlib/Limits.h"
+#include "kddlib/archive/ObjectInput.h"
 #include "kddlib/archive/PlainInput.h"
 #include "kddlib/net/dicom/DamagedFile.h"
 #include "kddlib/net/dicom/DicomFileReader.h"
+#include "kddlib/net/http/ObjectAddress.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/VolumeInfo.h"
 #include "platform/os/FileStatus.h"
@@ -118,22 +120,6 @@ DicomInput& take(DicomInput& input, std::unique_ptr<TagMap> map, qint64 pixels)
     return input;
 }
 
-/// Only the header is read, which tells the study and the series.
-DicomInput& takeVolume(DicomInput& input)
-{
-    Result result;
-    const std::unique_ptr<OrlanMesh> mesh = OrlanMesh::read(input.path, result);
-    if (mesh == nullptr)
-        return refuse(input, DicomInput::Kind::Unusable, result.text());
-    input.studyUID = dicomValue(*mesh, "G0020-000D");
-    input.seriesUID = dicomValue(*mesh, "G0020-000E");
-    if (input.studyUID.isEmpty() || input.seriesUID.isEmpty() || isStrange(input.studyUID) ||
-        isStrange(input.seriesUID))
-        return refuse(input, DicomInput::Kind::Unusable, QStringLiteral("It names no study and series"));
-    input.kind = DicomInput::Kind::Volume;
-    return input;
-}
-
 }  // namespace
 
 DicomInput::DicomInput() = default;
@@ -143,6 +129,8 @@ DicomInput::~DicomInput() = default;
 
 DicomInput readDicomInput(const QByteArray& path, Damage damage)
 {
+    if (isObjectAddress(path))
+        return takeObject(path, readObject(path, kDefaultValueBound));
     DicomInput plain;
     if (takePlain(path, readPlain(path, kDefaultValueBound), plain))
         return plain;
@@ -167,24 +155,53 @@ DicomInput parseInput(const QByteArray& path, Damage damage)
     input.fileBytes = file.size();
     if (input.fileBytes == 0)
         return std::move(refuse(input, DicomInput::Kind::Unusable, QStringLiteral("The file is empty")));
-    if (OrlanMesh::isVolumeFile(path))
-        return std::move(takeVolume(input));
+    if (OrlanMesh::isVolumeFile(path)) {
+        // Only the header is read, which tells the study and the series.
+        Result result;
+        const std::unique_ptr<OrlanMesh> mesh = OrlanMesh::read(path, result);
+        takeVolume(input, mesh, result);
+        return input;
+    }
     const bool isDicom = hasDicomPrefix(file);
     DcmFileFormat format;
     const OFCondition condition = damage == Damage::Refused
                                       ? readDicomFile(path.constData(), format)
                                       : readDamagedDicomFile(path.constData(), format, input.leftOut);
+    takeParsed(input, isDicom, condition, format);
+    return input;
+}
+
+void takeVolume(DicomInput& input, const std::unique_ptr<OrlanMesh>& mesh, const Result& result)
+{
+    if (mesh == nullptr) {
+        refuse(input, DicomInput::Kind::Unusable, result.text());
+        return;
+    }
+    input.studyUID = dicomValue(*mesh, "G0020-000D");
+    input.seriesUID = dicomValue(*mesh, "G0020-000E");
+    if (input.studyUID.isEmpty() || input.seriesUID.isEmpty() || isStrange(input.studyUID) ||
+        isStrange(input.seriesUID))
+        refuse(input, DicomInput::Kind::Unusable, QStringLiteral("It names no study and series"));
+    else
+        input.kind = DicomInput::Kind::Volume;
+}
+
+void takeParsed(DicomInput& input, bool hasPrefix, const OFCondition& condition, DcmFileFormat& format)
+{
     // A file with the prefix claims to be DICOM, so that it cannot be
     // read is a fault. Any other is something else.
-    if (condition.bad() || (!isDicom && !namesItself(*format.getDataset())))
-        return std::move(refuse(input, isDicom ? DicomInput::Kind::Unusable : DicomInput::Kind::Other,
-                                condition.bad() ? QString::fromLatin1(condition.text())
-                                                : QStringLiteral("No DICOM object")));
-    if (isMediaDirectory(format))
-        return std::move(refuse(input, DicomInput::Kind::Other, QStringLiteral("Media directory")));
+    if (condition.bad() || (!hasPrefix && !namesItself(*format.getDataset()))) {
+        refuse(input, hasPrefix ? DicomInput::Kind::Unusable : DicomInput::Kind::Other,
+               condition.bad() ? QString::fromLatin1(condition.text()) : QStringLiteral("No DICOM object"));
+        return;
+    }
+    if (isMediaDirectory(format)) {
+        refuse(input, DicomInput::Kind::Other, QStringLiteral("Media directory"));
+        return;
+    }
     DcmDataset& dataset = *format.getDataset();
     std::unique_ptr<TagMap> map(TagMap::createTagMap(&dataset, kDefaultValueBound));
-    return std::move(take(input, std::move(map), pixelBytes(dataset)));
+    take(input, std::move(map), pixelBytes(dataset));
 }
 
 bool takePlain(const QByteArray& path, PlainRead read, DicomInput& input)

@@ -2,7 +2,9 @@
 
 #include "kddlib/Limits.h"
 #include "kddlib/archive/FileWalk.h"
+#include "kddlib/archive/ObjectInput.h"
 #include "kddlib/archive/PlainInput.h"
+#include "kddlib/net/http/ObjectAddress.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
 #include "platform/os/FileStatus.h"
@@ -23,24 +25,57 @@ Result FileScan::run(const QList<QByteArray>& paths, const std::function<Result(
 /// its place, and of several files of one image the last counts.
 Result FileScan::readAll(const QList<QByteArray>& files, const std::function<Result(DicomInput)>& take)
 {
-    PlainFiles ahead(files, mReaders, kDefaultValueBound);
-    for (int i = 0; i < files.size(); ++i) {
-        if (mObserver.isCancelled())
-            return {};
-        DicomInput input;
-        if (!takePlain(files.at(i), ahead.next(), input))
-            input = parseInput(files.at(i), mDamage);
-        Result taken = handOn(std::move(input), take);
-        if (taken.bad())
-            return taken;
-        mObserver.progress(i + 1, files.size());
+    QList<QByteArray> urls;
+    QList<QByteArray> local;
+    for (const QByteArray& file : files)
+        (isObjectAddress(file) ? urls : local).append(file);
+    QHash<QByteArray, Kxg::FileStamp> known;
+    Result taken = urls.isEmpty() ? Result() : mCatalogue.stampsOf(urls, known);
+    PlainFiles filesAhead(local, mReaders, kDefaultValueBound);
+    PlainObjects objectsAhead(taken.good() ? urls : QList<QByteArray>(), known, kDefaultValueBound);
+    for (int i = 0; i < files.size() && taken.good() && !mObserver.isCancelled(); ++i) {
+        const QByteArray& file = files.at(i);
+        if (isObjectAddress(file))
+            taken = takeNext(file, objectsAhead, take);
+        else
+            taken = takeNext(file, filesAhead, take);
+        if (taken.good())
+            mObserver.progress(i + 1, files.size());
     }
-    return {};
+    return taken;
+}
+
+Result FileScan::takeNext(const QByteArray& file, PlainFiles& ahead,
+                          const std::function<Result(DicomInput)>& take)
+{
+    DicomInput input;
+    if (!takePlain(file, ahead.next(), input))
+        input = parseInput(file, mDamage);
+    return handOn(std::move(input), take);
+}
+
+Result FileScan::takeNext(const QByteArray& url, PlainObjects& ahead,
+                          const std::function<Result(DicomInput)>& take)
+{
+    ObjectRead read = ahead.next();
+    if (read.isUnchanged) {
+        ++mUnchanged;
+        return {};
+    }
+    return handOn(takeObject(url, std::move(read)), take);
 }
 
 Result FileScan::findChanged(const QList<QByteArray>& paths, QList<QByteArray>& changed)
 {
+    QSet<QByteArray> urls;
     for (const QByteArray& path : paths) {
+        // Whether an object is there is seen when it is asked for.
+        if (isObjectAddress(path)) {
+            if (!urls.contains(path))
+                changed.append(path);
+            urls.insert(path);
+            continue;
+        }
         QStringList faults;
         const QList<QByteArray> files = filesBelow({path}, faults);
         for (const QString& fault : qAsConst(faults)) {
@@ -79,7 +114,7 @@ Result FileScan::handOn(DicomInput input, const std::function<Result(DicomInput)
     switch (input.kind) {
     case DicomInput::Kind::Image:
         if (!input.leftOut.isEmpty())
-            LogFile::warnf("%s is damaged: left out %s", input.path.constData(),
+            LogFile::warnf("%s is damaged: left out %s", shownAddress(input.path).constData(),
                            qUtf8Printable(input.leftOut));
         break;
     case DicomInput::Kind::Volume:
@@ -88,11 +123,13 @@ Result FileScan::handOn(DicomInput input, const std::function<Result(DicomInput)
     case DicomInput::Kind::Other:
         ++mSkipped;
         if (mNamesSkipped)
-            LogFile::printf("Skipped %s: %s", input.path.constData(), qUtf8Printable(input.reason));
+            LogFile::printf("Skipped %s: %s", shownAddress(input.path).constData(),
+                            qUtf8Printable(input.reason));
         break;
     case DicomInput::Kind::Unusable:
-        LogFile::errorf("Could not take %s: %s", input.path.constData(), qUtf8Printable(input.reason));
-        mRefused.push_back({input.path, input.reason});
+        LogFile::errorf("Could not take %s: %s", shownAddress(input.path).constData(),
+                        qUtf8Printable(input.reason));
+        mRefused.push_back({shownAddress(input.path), input.reason});
         return {};
     }
     return take(std::move(input));

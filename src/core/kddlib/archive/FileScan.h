@@ -12,9 +12,16 @@
 namespace Kdd
 {
 
+class PlainFiles;
+class PlainObjects;
+
 /// Looks through files and folders for what the catalogue does not know yet, or knows otherwise: files whose path, size
 /// and time of change are known are not opened. The archive's own files are passed over. Used by the thread of its
 /// catalogue.
+///
+/// A path may be the URL of an object, "http://", "https://" or "gs://", which is read by its header. One whose URL, size
+/// and version are known is not read; a server that tells no version has it read each time. Messages show addresses
+/// without the secrets in them.
 class KDD_EXPORT FileScan
 {
 public:
@@ -50,6 +57,9 @@ private:
     Result findChanged(const QList<QByteArray>& paths, QList<QByteArray>& changed);
     bool isOwn(const QByteArray& file) const;
     Result readAll(const QList<QByteArray>& files, const std::function<Result(DicomInput)>& take);
+    Result takeNext(const QByteArray& file, PlainFiles& ahead, const std::function<Result(DicomInput)>& take);
+    Result takeNext(const QByteArray& url, PlainObjects& ahead,
+                    const std::function<Result(DicomInput)>& take);
     Result handOn(DicomInput input, const std::function<Result(DicomInput)>& take);
 
     Kxg::Catalogue& mCatalogue;

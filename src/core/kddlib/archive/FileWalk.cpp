@@ -1,5 +1,6 @@
 #include "kddlib/archive/FileWalk.h"
 
+#include "kddlib/net/http/ObjectAddress.h"
 #include "kddlib/tagfile/TagFileSettings.h"
 #include "platform/base/LogFile.h"
 #include "platform/os/FileStatus.h"
@@ -69,6 +70,8 @@ void collect(const std::filesystem::directory_entry& place, const QByteArray& ab
 
 QByteArray absolutePath(const QByteArray& path)
 {
+    if (isObjectAddress(path))
+        return path;
     QByteArray absolute = bytes(std::filesystem::absolute(path.toStdString()).lexically_normal());
     // A folder is one path, however it was written: what is known of it is asked for by that.
     if (absolute.size() > 1 && absolute.endsWith('/'))

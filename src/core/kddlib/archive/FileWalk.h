@@ -20,7 +20,7 @@ KDD_EXPORT QList<QByteArray> filesBelow(const QList<QByteArray>& paths, QStringL
 /// entered are told in the log; a meta folder that is not there has none.
 KDD_EXPORT QStringList tagFilesOfArchive();
 
-/// The path as `filesBelow` gives it.
+/// The path as `filesBelow` gives it; the URL of an object as it is.
 KDD_EXPORT QByteArray absolutePath(const QByteArray& path);
 
 }  // namespace Kdd

@@ -2,6 +2,7 @@
 
 #include "kddlib/archive/ContentDigest.h"
 #include "kddlib/archive/DicomInput.h"
+#include "kddlib/net/http/ObjectAddress.h"
 #include "kddlib/tagfile/StudyRecord.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
@@ -17,8 +18,10 @@ constexpr std::size_t kBatch = 1000;
 
 void warnOf(const Kxg::FileConflict& conflict)
 {
-    const char* path = conflict.path.constData();
-    const char* other = conflict.otherPath.constData();
+    const QByteArray shownPath = shownAddress(conflict.path);
+    const QByteArray shownOther = shownAddress(conflict.otherPath);
+    const char* path = shownPath.constData();
+    const char* other = shownOther.constData();
     switch (conflict.kind) {
     case Kxg::FileConflict::Kind::Replaces:
         LogFile::warnf("%s replaces %s: both are files of image %s", path, other,

@@ -6,7 +6,8 @@
 #include "kddlib/archive/FileWalk.h"
 #include "kddlib/archive/TagFileProof.h"
 #include "kddlib/archive/WorkObserver.h"
-#include "kddlib/net/dicom/KxDcmFileLoader.h"
+#include "kddlib/net/dicom/RemoteDicom.h"
+#include "kddlib/net/http/ObjectAddress.h"
 #include "kddlib/tagfile/TagFile.h"
 #include "kddlib/tagfile/qa/BuildCorrections.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
@@ -33,7 +34,7 @@ constexpr int kPatience = 10 * 60 * 1000;
 
 QString textOf(const QByteArray& bytes)
 {
-    return pathText(bytes);
+    return pathText(shownAddress(bytes));
 }
 
 /// Why a study's tag file cannot be read, more plainly than the reader can tell.
@@ -127,10 +128,26 @@ void StudyCheck::check(const QByteArray& studyUID)
     if (!mContents.isWaiting)
         checkListing(studyUID, file);
     checkPreviews(studyUID, file);
-    qint64 done = 0;
+    checkImages(file);
+}
+
+void StudyCheck::checkImages(const TagFile& file)
+{
     const auto& images = file.imagesByUID();
+    QList<QByteArray> urls;
+    for (const TagMap* image : images) {
+        const QByteArray path = filePathOf(*image);
+        if (isObjectAddress(path))
+            urls.append(path);
+    }
+    RemoteHeaders ahead(urls, kRemoteHead);
+    qint64 done = 0;
     for (auto it = images.cbegin(); it != images.cend() && !mObserver.isCancelled(); ++it) {
-        checkImage(it.key(), *it.value());
+        const QByteArray path = filePathOf(*it.value());
+        if (isObjectAddress(path))
+            checkLoaded(it.key(), *it.value(), ahead.next());
+        else
+            checkImage(it.key(), *it.value());
         mObserver.progress(++done, images.size());
     }
 }
@@ -220,15 +237,21 @@ void StudyCheck::checkPreviews(const QByteArray& studyUID, const TagFile& file)
 
 void StudyCheck::checkImage(const QByteArray& key, const TagMap& image)
 {
+    LoadedHeader loaded{std::make_unique<DcmFileFormat>(), {}};
+    loaded.condition = loadDicomHeader(filePathOf(image), *loaded.format);
+    checkLoaded(key, image, loaded);
+}
+
+void StudyCheck::checkLoaded(const QByteArray& key, const TagMap& image, const LoadedHeader& loaded)
+{
     const QByteArray path = filePathOf(image);
-    DcmFileFormat dicom;
-    const OFCondition condition = loadDicomFile(path.constData(), dicom);
-    if (condition.bad()) {
+    if (loaded.condition.bad()) {
         ++mFindings.unreadable;
-        mReport(
-            QStringLiteral("Could not load %1: %2").arg(textOf(path), QString::fromLatin1(condition.text())));
+        mReport(QStringLiteral("Could not load %1: %2")
+                    .arg(textOf(path), QString::fromLatin1(loaded.condition.text())));
         return;
     }
+    DcmFileFormat& dicom = *loaded.format;
     ++mFindings.images;
     const auto report = [&](const QByteArray& attribute, const QByteArray& what) {
         mReport(QStringLiteral("Image %1: %2 %3").arg(textOf(key), textOf(attribute), textOf(what)));

@@ -13,6 +13,7 @@ namespace Kdd
 {
 
 class BuildCorrections;
+struct LoadedHeader;
 class TagFile;
 class TagMap;
 class WorkObserver;
@@ -54,7 +55,9 @@ private:
     void checkListing(const QByteArray& studyUID, const TagFile& file);
     void checkVolumes(const QByteArray& studyUID, const TagFile& file);
     void checkPreviews(const QByteArray& studyUID, const TagFile& file);
+    void checkImages(const TagFile& file);
     void checkImage(const QByteArray& key, const TagMap& image);
+    void checkLoaded(const QByteArray& key, const TagMap& image, const LoadedHeader& loaded);
     void checkUnknown(const QString& path);
 
     Kxg::Catalogue& mCatalogue;

@@ -1,7 +1,9 @@
 #include "kddlib/archive/StudyCompletion.h"
 
+#include "kddlib/Limits.h"
 #include "kddlib/TagFileGenerator.h"
-#include "kddlib/archive/DicomInput.h"
+#include "kddlib/archive/ObjectInput.h"
+#include "kddlib/net/http/ObjectAddress.h"
 #include "kddlib/tagfile/StudyRecord.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
@@ -225,8 +227,15 @@ bool StudyCompletion::bringListed(const QByteArray& studyUID, TagFile& arrivals,
     }
     if (2 * absent.size() > mContents.images.size())
         return false;
+    QList<QByteArray> urls;
     for (const Kxg::ListedImage* listed : absent) {
-        DicomInput input = readDicomInput(listed->path, Damage::Refused);
+        if (isObjectAddress(listed->path))
+            urls.append(listed->path);
+    }
+    PlainObjects objects(urls, {}, kDefaultValueBound);
+    for (const Kxg::ListedImage* listed : absent) {
+        DicomInput input = isObjectAddress(listed->path) ? takeObject(listed->path, objects.next())
+                                                         : readDicomInput(listed->path, Damage::Refused);
         if (input.kind != DicomInput::Kind::Image || input.studyUID != studyUID ||
             input.seriesUID != listed->seriesInstanceUID ||
             input.map->uid(TagMap::ImageLevel) != listed->sopInstanceUID ||

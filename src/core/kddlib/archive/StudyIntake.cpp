@@ -4,6 +4,7 @@
 #include "kddlib/archive/ArchiveDatabase.h"
 #include "kddlib/archive/FileWalk.h"
 #include "kddlib/archive/StudyCompletion.h"
+#include "kddlib/net/http/ObjectAddress.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"
 
@@ -17,6 +18,21 @@ namespace
 
 /// Images held in memory before the studies that got none for the longest time are written.
 constexpr int kMaxPendingImages = 50000;
+
+/// Where to look for studies that wait: of objects behind URLs their folders, for lists have many of one.
+QList<QByteArray> placesOf(const QList<QByteArray>& paths)
+{
+    QList<QByteArray> places;
+    QSet<QByteArray> folders;
+    for (const QByteArray& path : paths) {
+        const QByteArray place =
+            isObjectAddress(path) ? path.left(path.lastIndexOf('/')) : absolutePath(path);
+        if (!folders.contains(place))
+            places.append(place);
+        folders.insert(place);
+    }
+    return places;
+}
 
 }  // namespace
 
@@ -40,8 +56,8 @@ Result StudyIntake::place(DicomInput& input)
     // Counted by what the study grows: a second file of an image takes the place of the first.
     const int before = study.file.imagesByUID().size();
     if (TagFileGenerator::place(study.file, std::move(input.map), path) == nullptr) {
-        LogFile::errorf("Could not take %s: it belongs nowhere", path.constData());
-        mRefused.push_back({path, QStringLiteral("It belongs nowhere")});
+        LogFile::errorf("Could not take %s: it belongs nowhere", shownAddress(path).constData());
+        mRefused.push_back({shownAddress(path), QStringLiteral("It belongs nowhere")});
         return {};
     }
     const int added = study.file.imagesByUID().size() - before;
@@ -132,9 +148,9 @@ Result StudyIntake::completeWaiting(const QList<QByteArray>& paths)
 {
     // Once for each study, though several paths may lead to its files.
     QSet<QByteArray> waiting;
-    for (const QByteArray& path : paths) {
+    for (const QByteArray& place : placesOf(paths)) {
         QVector<QByteArray> studies;
-        Result asked = mCatalogue.waitingStudies(absolutePath(path), studies);
+        Result asked = mCatalogue.waitingStudies(place, studies);
         if (asked.bad())
             return asked;
         for (const QByteArray& study : qAsConst(studies))

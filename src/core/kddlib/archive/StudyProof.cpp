@@ -3,6 +3,7 @@
 #include "kddlib/archive/ContentDigest.h"
 #include "kddlib/archive/StudyCompletion.h"
 #include "kddlib/archive/TagFileProof.h"
+#include "kddlib/net/http/ObjectAddress.h"
 #include "platform/os/FileStatus.h"
 #include "platform/os/PathName.h"
 #include "platform/volumefile/OrlanMesh.h"
@@ -135,6 +136,9 @@ StudyProof::Verdict StudyProof::check(const Kxg::FileDigest& file)
         mFault = QStringLiteral("File %1 %2").arg(pathText(file.path), QLatin1String(what));
         return Verdict::Faulty;
     };
+    // Of an object behind a URL the server knows its bytes; only its header is held against the tag file.
+    if (isObjectAddress(file.path))
+        return Verdict::Undigested;
     const char* const kChanged = "was changed since it was registered; \"kdd add\" takes it as it is now";
     FileStatus status;
     if (!statusOf(file.path.constData(), status))

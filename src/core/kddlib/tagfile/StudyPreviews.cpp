@@ -1,6 +1,7 @@
 #include "kddlib/tagfile/StudyPreviews.h"
 
-#include "kddlib/net/dicom/KxDcmFileLoader.h"
+#include "kddlib/net/dicom/RemoteDicom.h"
+#include "kddlib/net/http/ObjectAddress.h"
 #include "kddlib/previews/PreviewGenerator.h"
 #include "kddlib/previews/QuadrantNavigation.h"
 #include "kddlib/tagfile/StudyTree.h"
@@ -230,12 +231,14 @@ bool addPreview(TagMap* image, const QByteArray& file)
     if (image == nullptr)
         return false;
     DcmFileFormat format;
-    const OFCondition condition = loadDicomFile(file.constData(), format);
+    // Of many frames behind a URL the one that is shown is fetched.
+    const OFCondition condition = loadDicomHeader(file, format, kRemotePicture);
+    const QByteArray shown = shownAddress(file);
     if (condition.bad()) {
-        LogFile::warnf(kNotCreated, file.constData(), condition.text());
+        LogFile::warnf(kNotCreated, shown.constData(), condition.text());
         return false;
     }
-    return addPreview(image, format.getDataset(), pathText(file));
+    return addPreview(image, format.getDataset(), pathText(shown));
 }
 
 bool addPreview(const StudyTree& tree, DcmDataset* dataset, const QString& path)

@@ -11,6 +11,7 @@
 #include <kddlib/KxDcmFileLoader.h>
 #include <kddlib/KxVolumeInfo.h>
 #include <kddlib/LogFile.h>
+#include <kddlib/ObjectAddress.h>
 #include <kddlib/PathName.h>
 #include <kddlib/PreviewGenerator.h>
 #include <kddlib/TagMap.h>
@@ -78,12 +79,13 @@ Verdict ShownImage::open(const ServedStudy& study, const QByteArray& key)
     const OFCondition condition =
         mFile->loadFile(OFFilename(origin.path.constData()), EXS_Unknown, EGL_noChange, kLongestInMemory);
     if (condition.bad()) {
-        LogFile::errorf("%s: %s", origin.path.constData(), condition.text());
+        LogFile::errorf("%s: %s", shownAddress(origin.path).constData(), condition.text());
         const bool isGone = !KxCurlClient::isUrl(origin.path.constData()) && !QFile::exists(mPath);
         return {isGone ? 410 : 500, QStringLiteral("The instance's DICOM file cannot be read")};
     }
     if (!isSame(dataset(), origin)) {
-        LogFile::errorf("%s holds another image than %s by now", origin.path.constData(), key.constData());
+        LogFile::errorf("%s holds another image than %s by now", shownAddress(origin.path).constData(),
+                        key.constData());
         return {410, QStringLiteral("The instance's DICOM file holds another one by now")};
     }
     correct(dataset(), *shown);

@@ -2,14 +2,14 @@
 
 #include "server/dicomweb/MediaTypes.h"
 
-#include <kddlib/Limits.h>
-#include <kddlib/LogFile.h>
-#include <kddlib/TagMap.h>
-#include <kddlib/TagSequence.h>
-
 #include <QCryptographicHash>
 
 #include <dcmtk/dcmdata/dcdeftag.h>
+#include <kddlib/Limits.h>
+#include <kddlib/LogFile.h>
+#include <kddlib/ObjectAddress.h>
+#include <kddlib/TagMap.h>
+#include <kddlib/TagSequence.h>
 
 namespace Kdd::DicomWeb
 {
@@ -174,8 +174,8 @@ Verdict findBulkValue(const ServedStudy& study, const ListedImage& image, const 
         return opened;
     FileStretch stretch;
     if (!object.index.findValue(*object.bytes, steps, stretch)) {
-        LogFile::errorf("%s does not have %s, which the tag file left out", origin.path.constData(),
-                        textOf(steps).constData());
+        LogFile::errorf("%s does not have %s, which the tag file left out",
+                        shownAddress(origin.path).constData(), textOf(steps).constData());
         return {500, QStringLiteral("The instance's DICOM file does not have the value")};
     }
     value.source = object.bytes;

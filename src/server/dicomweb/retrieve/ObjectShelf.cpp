@@ -5,6 +5,7 @@
 #include <kddlib/FileStatus.h>
 #include <kddlib/KxCurlClient.h>
 #include <kddlib/LogFile.h>
+#include <kddlib/ObjectAddress.h>
 #include <kddlib/PathName.h>
 #include <kddlib/RegularFile.h>
 
@@ -34,15 +35,16 @@ Verdict ObjectShelf::open(const ImageOrigin& origin, FoundObject& found)
     FoundObject opened;
     const Result result = find(origin.path, opened);
     if (result.bad()) {
-        LogFile::errorf("%s cannot be served: %s", origin.path.constData(), qUtf8Printable(result.text()));
+        LogFile::errorf("%s cannot be served: %s", shownAddress(origin.path).constData(),
+                        qUtf8Printable(result.text()));
         const bool isGone = !KxCurlClient::isUrl(origin.path.constData()) &&
                             presenceOf(pathText(origin.path)) == FilePresence::Absent;
         return isGone ? Verdict{410, QStringLiteral("The image's DICOM file is gone")}
                       : Verdict{500, QStringLiteral("The image's DICOM file cannot be read or is damaged")};
     }
     if (!origin.isIn(opened.index)) {
-        LogFile::errorf("%s cannot be served: it holds image %s of study %s", origin.path.constData(),
-                        opened.index.sopInstanceUID().constData(),
+        LogFile::errorf("%s cannot be served: it holds image %s of study %s",
+                        shownAddress(origin.path).constData(), opened.index.sopInstanceUID().constData(),
                         opened.index.studyInstanceUID().constData());
         return {410, QStringLiteral("The image's DICOM file holds another image by now")};
     }

@@ -10,6 +10,7 @@
 #include "kddlib/net/dicom/LocalFiles.h"
 #include "kddlib/net/dicom/StoragePath.h"
 #include "kddlib/net/http/CurlError.h"
+#include "kddlib/net/http/ObjectAddress.h"
 #include "platform/base/LogFile.h"
 #include "platform/database/Kxg.h"
 
@@ -62,7 +63,7 @@ bool isAnswered(const char* name, KxCurlDownloadStream& stream)
 {
     const KxHttpStatus& status = stream.httpStatus();
     if (!status.ok())
-        LogFile::errorf("Reading %s failed: %s", name, status.reason().c_str());
+        LogFile::errorf("Reading %s failed: %s", shownAddress(name).constData(), status.reason().c_str());
     return status.ok();
 }
 
@@ -76,8 +77,8 @@ OFCondition told(const char* name, KxCurlDownloadStream& stream, const OFConditi
 
 OFCondition refuse(const char* name, const std::exception& fault)
 {
-    LogFile::write(LogFile::Severity::Error,
-                   "Reading " + LogFile::escaped(name) + " failed: " + textForLog(fault));
+    LogFile::write(LogFile::Severity::Error, "Reading " + LogFile::escaped(shownAddress(name).toStdString()) +
+                                                 " failed: " + textForLog(fault));
     return EC_InvalidStream;
 }
 

@@ -1,7 +1,7 @@
 #include "kddlib/tagfile/qa/AdoptedCorrections.h"
 
 #include "kddlib/Limits.h"
-#include "kddlib/net/dicom/KxDcmFileLoader.h"
+#include "kddlib/net/dicom/RemoteDicom.h"
 #include "kddlib/tagfile/StudyTree.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
@@ -96,7 +96,7 @@ bool AdoptedCorrections::identify(const TagMap& image, const AuditLog& log, Imag
     DcmFileFormat file;
     identity = identityBefore(log, identity, path);
     // Without the file the log has to tell what the image was.
-    if (loadDicomFile(path.constData(), file).bad())
+    if (loadDicomHeader(path, file).bad())
         return true;
     const std::unique_ptr<TagMap> loaded(TagMap::createTagMap(file.getDataset(), kDefaultValueBound));
     AuditLog own;
