@@ -22,8 +22,8 @@ def lines(*command):
 
 
 def built(folder):
-    found = [os.path.join(folder, "src/tools/kdd/kdd")]
-    found += glob.glob(os.path.join(folder, "**/*.so"), recursive=True)
+    found = [os.path.join(folder, name) for name in ("src/tools/kdd/kdd", "src/core/kddlib/libkdd.so")]
+    found += glob.glob(os.path.join(folder, "kddlib/*.so"))
     if not all(map(os.path.exists, found)) or len(found) < 3:
         sys.exit(f"{folder} holds no whole build of release")
     return found
@@ -31,13 +31,9 @@ def built(folder):
 
 def libraries(programs):
     """The real paths of what is loaded, and not built here."""
-    found = set()
-    for program in programs:
-        for line in lines("ldd", program):
-            match = re.search(r"(?:=> )?(/\S+) \(0x", line)
-            if match and not match.group(1).startswith(os.path.dirname(os.path.abspath(programs[0])).split("/src/")[0]):
-                found.add(os.path.realpath(match.group(1)))
-    return found
+    found = {os.path.realpath(path) for program in programs for line in lines("ldd", program)
+             for path in re.findall(r"(/\S+) \(0x", line)}
+    return found - {os.path.realpath(program) for program in programs}
 
 
 def package_of(path):

@@ -12,7 +12,7 @@ def faults(model, study):
     if study not in model.shown:
         return found if study in model.waiting and study not in model.there else found + ["Study %s has" % study]
     if study not in model.waiting and study in model.spoiled:
-        found.append("The tag file of study %s is not the one that was written last" % study)
+        found.append("The tag file of study %s, " % study)
     for key, image in model.shown[study].items():
         file = model.disk.get(image.path)
         if file is None:

@@ -62,12 +62,12 @@ headers=$root/usr/include/kddlib
 ! grep -rn '#include "' "$headers" || fail "An installed header names a folder of the source"
 ! grep -rIl "$build" "$root/usr" || fail "These know where they were built"
 for file in "$root"/usr/bin/kdd "$root"/usr/lib/*/libkdd.so.0 "$root"/usr/lib/*/kddlib/*.so; do
-    readelf -dW "$file" | grep -q BIND_NOW || fail "$file resolves names after its start"
+    grep -q BIND_NOW <<<"$(readelf -dW "$file")" || fail "$file resolves names after its start"
     ! readelf -d "$file" | grep -E 'R(UN)?PATH' | grep -v '\[\$ORIGIN/' || fail "$file looks for libraries elsewhere"
 done
 
-for file in "$root"/usr/bin/kdd "$root"/usr/lib/*/libkdd.so.0; do
-    readelf --dyn-syms -W "$file" | grep -q __stack_chk_fail || fail "$file does not watch its stack"
+for file in "$root"/usr/lib/*/libkdd.so.0 "$root"/usr/lib/*/kddlib/kdd-tool.so; do
+    grep -q __stack_chk_fail <<<"$(readelf --dyn-syms -W "$file")" || fail "$file does not watch its stack"
 done
 
 "$materials" "$build" >"$folder/materials.json"

@@ -15,15 +15,35 @@
 #include <iostream>
 #include <vector>
 
+namespace
+{
+
+void show(int priority, const char* format, va_list arguments)
+{
+    char line[200];
+    std::vsnprintf(line, sizeof line, format, arguments);
+    std::cerr << '<' << priority << '>' << line << '\n';
+}
+
+}  // namespace
+
 /// The system's log of this program, where it can be seen.
 extern "C" void syslog(int priority, const char* format, ...)
 {
-    char line[200];
     va_list arguments;
     va_start(arguments, format);
-    std::vsnprintf(line, sizeof line, format, arguments);
+    show(priority, format, arguments);
     va_end(arguments);
-    std::cerr << '<' << priority << '>' << line << '\n';
+}
+
+/// The same as it is called where the C library checks calls.
+extern "C" void __syslog_chk(int priority, int /*flag*/, const char* format,
+                             ...)  // NOLINT(bugprone-reserved-identifier)
+{
+    va_list arguments;
+    va_start(arguments, format);
+    show(priority, format, arguments);
+    va_end(arguments);
 }
 
 namespace Kdd
