@@ -147,13 +147,14 @@ Kdd::Result SqlCatalogue::nextToCheck(qint64 before, CheckedStudy& study)
 Kdd::Result SqlCatalogue::noteCheck(const CheckedStudy& study, bool isDone)
 {
     return transact(Access::Write, [&] {
-        if (isDone)
+        if (isDone) {
             mConnection.change(
                 "UPDATE study SET checked = ?, check_faults = ?, check_position = NULL WHERE uid = ?",
                 {presentMs(), study.faults, textValue(study.studyInstanceUID)});
-        else
+        } else {
             mConnection.change("UPDATE study SET check_faults = ?, check_position = ? WHERE uid = ?",
                                {study.faults, bytesValue(study.position), textValue(study.studyInstanceUID)});
+        }
     });
 }
 

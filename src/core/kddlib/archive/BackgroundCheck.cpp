@@ -29,6 +29,12 @@ constexpr int kPatience = 1000;
 /// Of one study so many faults are told: a disk that is out of reach is one fault and not a million lines.
 constexpr int kMostTold = 20;
 
+void tell(const QString& fault, int& told)
+{
+    if (++told <= kMostTold)
+        LogFile::errorf("%s", qUtf8Printable(fault));
+}
+
 }  // namespace
 
 struct BackgroundCheck::Private
@@ -36,7 +42,6 @@ struct BackgroundCheck::Private
     void work();
     Result step(bool& isIdle);
     Result check(Kxg::CheckedStudy study);
-    void tell(const QString& fault, int& told) const;
     void note(const StudyProof::Findings& findings, bool isDone);
     bool take(qint64 bytes);
     bool rest(milliseconds time);
@@ -159,12 +164,6 @@ Result BackgroundCheck::Private::check(Kxg::CheckedStudy study)
         LogFile::errorf("Study %s: %d faults in all", study.studyInstanceUID.constData(), study.faults);
     note(proof.findings(), isDone);
     return result;
-}
-
-void BackgroundCheck::Private::tell(const QString& fault, int& told) const
-{
-    if (++told <= kMostTold)
-        LogFile::errorf("%s", qUtf8Printable(fault));
 }
 
 void BackgroundCheck::Private::note(const StudyProof::Findings& findings, bool isDone)

@@ -122,7 +122,7 @@ Result StudyProof::settle(Kxg::FileDigest file, Verdict& verdict)
 {
     while (verdict == Verdict::Faulty) {
         Kxg::FileDigest present;
-        const Result result = mCatalogue.fileDigest(file.path, present);
+        Result result = mCatalogue.fileDigest(file.path, present);
         if (result.bad() || isSame(present, file))
             return result;
         verdict = present.path.isEmpty() ? Verdict::Sound : check(file = present);
@@ -217,7 +217,7 @@ Result StudyProof::record()
 {
     if (mDigested.empty())
         return {};
-    const Result result = mCatalogue.recordDigests(mDigested);
+    Result result = mCatalogue.recordDigests(mDigested);
     if (result.good())
         mFindings.recorded += static_cast<int>(mDigested.size());
     mDigested.clear();
