@@ -9,6 +9,8 @@
 #include "support/RealFiles.h"
 #include "support/TreeText.h"
 
+#include <QtEndian>
+
 #include <dcmtk/dcmdata/dcpxitem.h>
 
 using namespace Kdd;
@@ -125,6 +127,10 @@ TEST_P(PlainInput, SaysWhatTheParserSays)
               encoding.isPlainWithSequences);
     EXPECT_EQ(isPlain(save(anImage("1").bytes({1, 2}, DCM_PixelData), encoding.xfer, encoding.lengths)),
               encoding.isPlain);
+    const QByteArray whole = fileContent(path());
+    const int end = 144 + qFromLittleEndian<int>(whole.constData() + 140);
+    putFile(path(), whole.left(end));
+    EXPECT_FALSE(isPlain(path())) << "nothing follows the meta information";
 }
 
 /// Whatever the damage is: what is taken all the same is what the parser takes.

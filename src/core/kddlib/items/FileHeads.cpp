@@ -17,6 +17,9 @@ constexpr int kFragmentsLength = sizeof(kFragments) - 1;
 constexpr int kFragmentHead = 8;
 constexpr quint32 kItem = 0xe000fffe;
 
+/// Whoever says that there are more has them looked at one by one, later.
+constexpr int kMostFragments = 1000;
+
 /// Whoever needs more than the head opens the file once more, which has to be the same still: many files that stay open would
 /// leave no descriptors for others.
 class FetchedSource : public PlainSource
@@ -66,11 +69,14 @@ void touchFragments(const RandomAccessFile& file, const char* head, qint64 count
 {
     const char* const end = head + count;
     const char* const found = std::search(head, end, kFragments, kFragments + kFragmentsLength);
-    char item[kFragmentHead];
-    for (qint64 at = found - head + kFragmentsLength; found != end && at <= file.size() - kFragmentHead &&
-                                                      file.readAt(at, item, kFragmentHead) == kFragmentHead &&
-                                                      qFromLittleEndian<quint32>(item) == kItem;)
+    qint64 at = found - head + kFragmentsLength;
+    for (int left = found == end ? 0 : kMostFragments; left > 0; --left) {
+        char item[kFragmentHead];
+        if (at > file.size() - kFragmentHead || file.readAt(at, item, kFragmentHead) != kFragmentHead ||
+            qFromLittleEndian<quint32>(item) != kItem)
+            return;
         at += kFragmentHead + qint64(qFromLittleEndian<quint32>(item + 4));
+    }
 }
 
 }  // namespace

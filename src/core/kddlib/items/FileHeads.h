@@ -22,7 +22,7 @@ public:
 
     /// Opens `count` files from `paths.at(first)` on, asks for all of their heads before it reads one, so that a disk or a
     /// server far away works on several at a time, and also for what else the header of an image needs whose pixels are
-    /// compressed.
+    /// compressed. The paths must outlive what is asked afterwards.
     void fetch(const QList<QByteArray>& paths, int first, int count);
 
     /// The file of number `i`, from 0 on, by what was fetched of it, which must outlive the answer; null when it could not be

@@ -89,7 +89,9 @@ public:
         qint64 at = 0;
         image.map = std::make_unique<TagMap>();
         Span dataset{mBytes.size(), false, 0};
-        if (!readMeta(at) || !readElements(dataset, maxLength, at, *image.map) || !mBytes.isOfOnePiece())
+        // Of a dataset without anything the parser guesses the syntax.
+        if (!readMeta(at) || at == mBytes.size() || !readElements(dataset, maxLength, at, *image.map) ||
+            !mBytes.isOfOnePiece())
             return false;
         image.map->putAndInsertValue(kTransferSyntax, VrCode::OB,
                                      QByteArray(1, static_cast<char>(mSyntax.getXfer())));
