@@ -91,6 +91,7 @@ set(KDD_PUBLIC_HEADERS
   platform/compression/QxCompress.h
   platform/database/Catalogue.h
   platform/database/DirectoryEntry.h
+  platform/database/FileRecords.h
   platform/database/Kxg.h
   platform/database/SearchRecord.h
   platform/database/SearchText.h
