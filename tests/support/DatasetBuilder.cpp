@@ -2,6 +2,9 @@
 
 #include "kddlib/tagmodel/TagMap.h"
 
+#include <dcmtk/dcmdata/dcpixseq.h>
+#include <dcmtk/dcmdata/dcpxitem.h>
+
 #include <stdexcept>
 
 namespace Kdd
@@ -49,6 +52,20 @@ DatasetBuilder& DatasetBuilder::numbers(const DcmTagKey& key, const std::vector<
 DatasetBuilder& DatasetBuilder::withLong(const DcmTag& tag, int length)
 {
     return with(tag, QByteArray(length, 'x').constData());
+}
+
+DatasetBuilder& DatasetBuilder::fragments(E_TransferSyntax xfer, const std::vector<int>& sizes)
+{
+    auto* pixels = new DcmPixelData(DcmTag(DCM_PixelData, EVR_OB));
+    auto* sequence = new DcmPixelSequence(DcmTag(DCM_PixelData, EVR_OB));
+    for (const int size : sizes) {
+        auto* fragment = new DcmPixelItem(DcmTag(DCM_Item, EVR_OB));
+        fragment->putUint8Array(std::vector<Uint8>(static_cast<std::size_t>(size), 1).data(),
+                                static_cast<unsigned long>(size));
+        sequence->insert(fragment);
+    }
+    pixels->putOriginalRepresentation(xfer, nullptr, sequence);
+    return with(pixels);
 }
 
 DatasetBuilder& DatasetBuilder::with(DcmElement* element)

@@ -35,6 +35,9 @@ public:
     /// A text of `length` characters.
     DatasetBuilder& withLong(const DcmTag& tag, int length);
 
+    /// Compressed pixels in fragments of so many bytes, the first of which is the table of offsets.
+    DatasetBuilder& fragments(E_TransferSyntax xfer, const std::vector<int>& sizes);
+
     /// Takes the element over.
     DatasetBuilder& with(DcmElement* element);
 

@@ -2,13 +2,9 @@
 
 #include "kddlib/Limits.h"
 #include "kddlib/StudySources.h"
-#include "kddlib/net/KxCurlClient.h"
 #include "kddlib/net/dicom/KxDcmFileLoader.h"
 #include "kddlib/net/dicom/RemoteDicom.h"
-#include "kddlib/net/http/KxHttpStatus.h"
 #include "kddlib/net/http/ObjectAddress.h"
-#include "kddlib/previews/PreviewGenerator.h"
-#include "kddlib/previews/QuadrantNavigation.h"
 #include "kddlib/tagfile/CorrectedVolumes.h"
 #include "kddlib/tagfile/TagFile.h"
 #include "kddlib/tagfile/TagFileRemoval.h"
@@ -16,10 +12,9 @@
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/volumes/Volume.h"
+#include "kddlib/volumes/VolumeFileOpening.h"
 #include "kddlib/volumes/VolumeInfo.h"
 #include "platform/base/LogFile.h"
-#include "platform/late/LateLibrary.h"
-#include "platform/os/PathName.h"
 #include "platform/volumefile/OrlanMesh.h"
 
 #include <QMap>
@@ -27,8 +22,6 @@
 #include <QThread>
 
 #include <dcmtk/dcmdata/dcfilefo.h>
-
-#include <exception>
 
 namespace Kdd
 {
@@ -39,8 +32,6 @@ namespace
 const char* const kDefaultUser = "zp_administrator";
 
 const char* const kSeriesInstanceUID = "G0020-000E";
-const char* const kModality = "G0008-0060";
-const char* const kMammography = "MG";
 
 /// Of two minutes in all, for a removal does not wait itself.
 constexpr int kRemovalAttempts = 6000;
@@ -51,39 +42,6 @@ constexpr char kForeign[] = "File %s does not belong to study %s";
 const char* userOrDefault(const char* user)
 {
     return user != nullptr ? user : kDefaultUser;
-}
-
-/// False, with the reason logged, when the bytes cannot be had.
-bool download(const char* url, QByteArray& bytes)
-{
-    KxHttpStatus status;
-    try {
-        bytes = KxCurlClient::instance().readBytes(url, status);
-    } catch (const std::exception& fault) {
-        LogFile::errorf("Reading %s failed: %s", shownAddress(url).constData(), fault.what());
-        return false;
-    }
-    if (status.failed)
-        LogFile::errorf("Reading %s failed: %s", shownAddress(url).constData(), status.failure.c_str());
-    else if (!status.ok())
-        LogFile::errorf("Reading %s failed: HTTP response code %d", shownAddress(url).constData(),
-                        status.code);
-    return status.ok();
-}
-
-/// Null, with the reason logged, when there is no usable volume file.
-std::unique_ptr<OrlanMesh> openVolume(const char* path)
-{
-    Result result;
-    std::unique_ptr<OrlanMesh> mesh;
-    QByteArray bytes;
-    if (!KxCurlClient::isUrl(path))
-        mesh = OrlanMesh::read(QByteArray(path), result);
-    else if (download(path, bytes))
-        mesh = OrlanMesh::read(bytes, path, result);
-    if (result.bad())
-        LogFile::errorf("%s", qUtf8Printable(result.text()));
-    return mesh;
 }
 
 }  // namespace
@@ -318,49 +276,6 @@ TagMap* TagFileGenerator::place(TagFile& tagFile, std::unique_ptr<TagMap> image,
     return placed;
 }
 
-/// Of the images chosen those that are held.
-void TagFileGenerator::addPreviews(TagFile& tagFile, const QList<QByteArray>& chosen,
-                                   const StudySources& sources)
-{
-    const StopwatchSum::Running running(mPreviewWatch);
-    QList<TagMap*> images;
-    QList<QByteArray> urls;
-    for (const QByteArray& sopUID : chosen) {
-        TagMap* image = tagFile.findImage(sopUID);
-        if (image == nullptr)
-            continue;
-        const QByteArray path = filePathOf(*image);
-        // Its file could not be read before, so the preview that it brought along is the best there is.
-        if (sources.kept.contains(path) && image->findElement(kPreview) != nullptr)
-            continue;
-        images.append(image);
-        if (isObjectAddress(path))
-            urls.append(path);
-    }
-    RemoteHeaders ahead(urls, kRemotePicture);
-    for (TagMap* image : qAsConst(images)) {
-        const QByteArray path = filePathOf(*image);
-        if (isObjectAddress(path))
-            addPreview(tagFile, *image, path, ahead.next());
-        else if (DcmDataset* dataset = sources.datasets.find(path))
-            tagFile.addPreview(image, dataset, pathText(path));
-        else
-            tagFile.addPreview(image, path);
-    }
-}
-
-/// Of many frames behind a URL the one that is shown is fetched.
-void TagFileGenerator::addPreview(TagFile& tagFile, TagMap& image, const QByteArray& url,
-                                  const LoadedHeader& loaded)
-{
-    const QByteArray shown = shownAddress(url);
-    if (loaded.condition.good())
-        tagFile.addPreview(&image, loaded.format->getDataset(), pathText(shown));
-    else
-        LogFile::warnf("Could not create preview image for DICOM file: %s (%s)", shown.constData(),
-                       loaded.condition.text());
-}
-
 void TagFileGenerator::addVolumeInfo(TagFile& tagFile, const std::vector<std::string>& volumeFiles)
 {
     StudySources nothingElse((TagFile()));
@@ -404,33 +319,18 @@ void TagFileGenerator::addVolumes(TagFile& tagFile, const std::vector<std::strin
 VolumeInfo* TagFileGenerator::createVolumeInfo(const char* path, QByteArray& seriesInstanceUID)
 {
     const StopwatchSum::Running running(mVolumeWatch);
-    const std::unique_ptr<OrlanMesh> mesh = openVolume(path);
-    if (mesh == nullptr)
+    Result result;
+    const std::unique_ptr<OrlanMesh> mesh = openVolumeFile(path, result);
+    if (mesh == nullptr) {
+        LogFile::errorf("%s", qUtf8Printable(result.text()));
         return nullptr;
+    }
     auto info = std::make_unique<VolumeInfo>();
     seriesInstanceUID = dicomValue(*mesh, kSeriesInstanceUID);
     if (!info->readHeader(*mesh, path))
         return nullptr;
     addPreview(*mesh, path, *info);
     return info.release();
-}
-
-/// Of the middle slice. Of a mammogram the same picture tells where the breast lies.
-void TagFileGenerator::addPreview(OrlanMesh& mesh, const char* path, VolumeInfo& info)
-{
-    const StopwatchSum::Running running(mPreviewWatch);
-    if (const Result loaded = loadLate(LateLibrary::Pictures); loaded.bad())
-        return LogFile::warnf("Could not create preview image of %s: %s", path,
-                              qUtf8Printable(loaded.text()));
-    const Vec2i size = TagFile::previewSize();
-    const QImage image = PreviewGenerator::createPreviewImage(
-        &mesh, path, static_cast<unsigned long>(size.x), static_cast<unsigned long>(size.y), info.dims.z / 2);
-    if (image.isNull())
-        return;
-    info.preview = PreviewGenerator::createPreviewData(image);
-    if (dicomValue(mesh, kModality) == kMammography)
-        info.quadrantData = QuadrantNavigation::computeImageBoxAndCenter(
-            image, QuadrantNavigation::checkOrientation(mesh.parameters().bundle("DICOM")));
 }
 
 }  // namespace Kdd

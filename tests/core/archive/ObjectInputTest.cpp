@@ -10,7 +10,6 @@
 #include <QTemporaryDir>
 #include <QUrl>
 
-#include <dcmtk/dcmdata/dcpxitem.h>
 #include <gmock/gmock.h>
 
 using namespace Kdd;
@@ -83,16 +82,8 @@ TEST_F(ObjectInput, IsWhatAFileOfTheSameBytesIs)
 TEST_F(ObjectInput, PassesOverFragmentsToTheLastOne)
 {
     DatasetBuilder image = anImage("1.2");
-    auto* pixels = new DcmPixelData(DcmTag(DCM_PixelData, EVR_OB));
-    auto* fragments = new DcmPixelSequence(DcmTag(DCM_PixelData, EVR_OB));
-    for (const int size : {0, 70000, 4, 3000}) {
-        auto* fragment = new DcmPixelItem(DcmTag(DCM_Item, EVR_OB));
-        fragment->putUint8Array(std::vector<Uint8>(static_cast<std::size_t>(size), 1).data(),
-                                static_cast<unsigned long>(size));
-        fragments->insert(fragment);
-    }
-    pixels->putOriginalRepresentation(EXS_JPEGProcess14SV1, nullptr, fragments);
-    const QByteArray whole = saved(image.with(pixels), EXS_JPEGProcess14SV1);
+    image.fragments(EXS_JPEGProcess14SV1, {0, 70000, 4, 3000});
+    const QByteArray whole = saved(image, EXS_JPEGProcess14SV1);
     expectSame(whole);
     for (const int cut : {1, 3000, 4000})
         expectSame(whole.chopped(cut));

@@ -1,7 +1,6 @@
-#include "kddlib/archive/PlainInput.h"
-
 #include "kddlib/Limits.h"
 #include "kddlib/archive/DicomInput.h"
+#include "kddlib/archive/ReadInput.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "support/DatasetBuilder.h"
 #include "support/FileContent.h"
@@ -10,8 +9,6 @@
 #include "support/TreeText.h"
 
 #include <QtEndian>
-
-#include <dcmtk/dcmdata/dcpxitem.h>
 
 using namespace Kdd;
 
@@ -165,16 +162,8 @@ INSTANTIATE_TEST_SUITE_P(Encodings, PlainInput, testing::ValuesIn(kEncodings),
 TEST_F(PlainInputFile, CountsFragmentsAndPassesOverThem)
 {
     DatasetBuilder image = anImage("1.2");
-    auto* pixels = new DcmPixelData(DcmTag(DCM_PixelData, EVR_OB));
-    auto* fragments = new DcmPixelSequence(DcmTag(DCM_PixelData, EVR_OB));
-    for (const int size : {0, 70000, 4, 3000}) {
-        auto* fragment = new DcmPixelItem(DcmTag(DCM_Item, EVR_OB));
-        fragment->putUint8Array(std::vector<Uint8>(static_cast<std::size_t>(size), 1).data(),
-                                static_cast<unsigned long>(size));
-        fragments->insert(fragment);
-    }
-    pixels->putOriginalRepresentation(EXS_JPEGProcess14SV1, nullptr, fragments);
-    image.with(pixels).bytes({1, 2, 3, 4}, DCM_DataSetTrailingPadding);
+    image.fragments(EXS_JPEGProcess14SV1, {0, 70000, 4, 3000});
+    image.bytes({1, 2, 3, 4}, DCM_DataSetTrailingPadding);
     const QByteArray whole = fileContent(save(image, EXS_JPEGProcess14SV1, EET_UndefinedLength));
     EXPECT_TRUE(isPlain(path()));
     for (const int cut : {1, 15, 20, 3000, 4000, 73000}) {

@@ -4,6 +4,7 @@
 #include "platform/base/OrderedWork.h"
 #include "platform/late/LateLibrary.h"
 #include "platform/os/RandomAccessFile.h"
+#include "platform/resources/ExResource.h"
 
 #include <openssl/evp.h>
 
@@ -102,19 +103,27 @@ DigestedFile digestFile(const QByteArray& path, const BytesTaken& taken)
     return read;
 }
 
-Result digestRegistered(Kxg::Catalogue& catalogue, std::vector<Kxg::FileDigest> files)
+Result digestRegistered(Kxg::Catalogue& catalogue, const Kxg::FileRecords& files)
 {
-    files.erase(std::remove_if(files.begin(), files.end(),
-                               [](const Kxg::FileDigest& file) { return isObjectAddress(file.path); }),
-                files.end());
-    OrderedWork<QByteArray> work(static_cast<int>(files.size()), 0, [&files](int i) {
-        const Kxg::FileDigest& file = files[static_cast<std::size_t>(i)];
+    std::vector<Kxg::FileDigest> wanted;
+    const auto want = [&](const QByteArray& path, const Kxg::FileStamp& stamp, bool isVolume) {
+        if (!isObjectAddress(path))
+            wanted.push_back({path, stamp, {}, isVolume});
+    };
+    if (ExResource::takesFileDigests()) {
+        for (const Kxg::DicomFileRecord& file : files.dicom)
+            want(file.path, file.stamp, false);
+        for (const Kxg::VolumeFileRecord& file : files.volumes)
+            want(file.path, file.stamp, true);
+    }
+    OrderedWork<QByteArray> work(static_cast<int>(wanted.size()), 0, [&wanted](int i) {
+        const Kxg::FileDigest& file = wanted[static_cast<std::size_t>(i)];
         const DigestedFile read = digestFile(file.path);
         return read.fault == DigestedFile::Fault::None && read.stamp == file.stamp ? read.digest
                                                                                    : QByteArray();
     });
     std::vector<Kxg::FileDigest> digested;
-    for (const Kxg::FileDigest& file : files) {
+    for (const Kxg::FileDigest& file : wanted) {
         QByteArray digest = work.next();
         if (!digest.isEmpty())
             digested.push_back({file.path, file.stamp, std::move(digest), file.isVolume});

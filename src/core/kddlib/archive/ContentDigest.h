@@ -57,8 +57,9 @@ using BytesTaken = std::function<bool(qint64 count)>;
 /// Reads all of a regular file.
 DigestedFile digestFile(const QByteArray& path, const BytesTaken& taken = {});
 
-/// Takes the digests of files that were just registered and keeps them, several files at a time. What is another file by
-/// now, or cannot be read, gets none. Failure: that of the database.
-Result digestRegistered(Kxg::Catalogue& catalogue, std::vector<Kxg::FileDigest> files);
+/// Takes the digests of files that were just registered and keeps them, several files at a time, where the site wants that
+/// (`ExResource::takesFileDigests`). What is another file by now, cannot be read, or lies behind a URL gets none. Failure: that of
+/// the database.
+Result digestRegistered(Kxg::Catalogue& catalogue, const Kxg::FileRecords& files);
 
 }  // namespace Kdd

@@ -2,7 +2,7 @@
 
 #include "kddlib/Limits.h"
 #include "kddlib/archive/ObjectInput.h"
-#include "kddlib/archive/PlainInput.h"
+#include "kddlib/archive/ReadInput.h"
 #include "kddlib/net/dicom/DamagedFile.h"
 #include "kddlib/net/dicom/DicomFileReader.h"
 #include "kddlib/net/http/ObjectAddress.h"
@@ -158,8 +158,7 @@ DicomInput parseInput(const QByteArray& path, Damage damage)
     if (OrlanMesh::isVolumeFile(path)) {
         // Only the header is read, which tells the study and the series.
         Result result;
-        const std::unique_ptr<OrlanMesh> mesh = OrlanMesh::read(path, result);
-        takeVolume(input, mesh, result);
+        takeVolume(input, OrlanMesh::read(path, result).get(), result);
         return input;
     }
     const bool isDicom = hasDicomPrefix(file);
@@ -171,7 +170,7 @@ DicomInput parseInput(const QByteArray& path, Damage damage)
     return input;
 }
 
-void takeVolume(DicomInput& input, const std::unique_ptr<OrlanMesh>& mesh, const Result& result)
+void takeVolume(DicomInput& input, const OrlanMesh* mesh, const Result& result)
 {
     if (mesh == nullptr) {
         refuse(input, DicomInput::Kind::Unusable, result.text());

@@ -3,7 +3,7 @@
 #include "kddlib/Limits.h"
 #include "kddlib/archive/FileWalk.h"
 #include "kddlib/archive/ObjectInput.h"
-#include "kddlib/archive/PlainInput.h"
+#include "kddlib/archive/ReadInput.h"
 #include "kddlib/net/http/ObjectAddress.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "platform/base/LogFile.h"

@@ -1,11 +1,10 @@
 #include "kddlib/archive/ObjectInput.h"
 
-#include "kddlib/archive/PlainInput.h"
-#include "kddlib/net/KxCurlClient.h"
+#include "kddlib/archive/ReadInput.h"
 #include "kddlib/net/dicom/RemoteDicom.h"
 #include "kddlib/net/dicom/RemoteFile.h"
-#include "kddlib/net/http/KxHttpStatus.h"
 #include "kddlib/tagmodel/TagMap.h"
+#include "kddlib/volumes/VolumeFileOpening.h"
 #include "platform/volumefile/OrlanMesh.h"
 
 #include <dcmtk/config/osconfig.h>
@@ -13,7 +12,6 @@
 #include <dcmtk/dcmdata/dcfilefo.h>
 
 #include <cstring>
-#include <exception>
 #include <utility>
 
 namespace Kdd
@@ -26,29 +24,16 @@ namespace
 constexpr qint64 kHead = 132;
 constexpr char kVolumeFile[] = "\x89HDF\r\n\x1a\n";
 
-/// Its header may lie anywhere in it.
-void takeVolumeObject(DicomInput& input)
-try {
-    KxHttpStatus status;
-    const QByteArray bytes = KxCurlClient::instance().readBytes(input.path.toStdString(), status);
-    Result result;
-    std::unique_ptr<OrlanMesh> mesh;
-    if (!status.ok())
-        result = Result::failure(QString::fromStdString(status.reason()));
-    else
-        mesh = OrlanMesh::read(bytes, input.path, result);
-    takeVolume(input, mesh, result);
-} catch (const std::exception& fault) {
-    takeVolume(input, nullptr, Result::failure(QString::fromUtf8(fault.what())));
-}
-
 void takeOther(DicomInput& input, const std::shared_ptr<RemoteFile>& file)
 {
     char head[kHead] = {};
     const qint64 got = file->readAt(0, head, kHead);
     if (got >= static_cast<qint64>(std::strlen(kVolumeFile)) &&
-        std::memcmp(head, kVolumeFile, std::strlen(kVolumeFile)) == 0)
-        return takeVolumeObject(input);
+        std::memcmp(head, kVolumeFile, std::strlen(kVolumeFile)) == 0) {
+        Result result;
+        takeVolume(input, openVolumeFile(input.path, result).get(), result);
+        return;
+    }
     const bool hasPrefix = got == kHead && std::memcmp(head + kHead - 4, "DICM", 4) == 0;
     DcmFileFormat format;
     const OFCondition condition = readRemoteDicom(file, format);

@@ -264,9 +264,10 @@ Result ObjectStore::Private::takeIn(const QByteArray& place, Kxg::Catalogue& cat
     LogFile::warnf("%s was stored by a server that ended before it told so; it is taken in now",
                    place.constData());
     QSet<QByteArray> corrected;
-    const Kxg::FileDigest taken{place, images[0].stamp, {}, false};
-    result = studies.add(std::move(images), catalogue, corrected);
-    return result.good() && takesDigests ? digestRegistered(catalogue, {taken}) : result;
+    const DigestedFile read = takesDigests ? digestFile(place) : DigestedFile();
+    if (read.digest.isEmpty() || !(read.stamp == images[0].stamp))
+        return studies.add(std::move(images), catalogue, corrected);
+    return studies.add(std::move(images), {{place, read.digest}}, catalogue, corrected);
 }
 
 }  // namespace Kdd

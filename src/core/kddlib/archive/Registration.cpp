@@ -62,25 +62,13 @@ Result Registration::add(const DicomInput& input)
     return files < kBatch ? Result() : flush();
 }
 
+/// Digests come after the files are registered: whatever dies meanwhile leaves files without one, which is told and can be
+/// mended, and the database is not kept waiting for the disk.
 Result Registration::flush()
 {
-    if (!ExResource::takesFileDigests())
-        return flushUndigested();
-    const Kxg::FileRecords files = mBatch;
+    const Kxg::FileRecords files = ExResource::takesFileDigests() ? mBatch : Kxg::FileRecords();
     Result registered = flushUndigested();
-    return registered.good() ? digest(files) : registered;
-}
-
-/// After they are registered: whatever dies meanwhile leaves files without a digest, which is told and can be mended, and
-/// the database is not kept waiting for the disk.
-Result Registration::digest(const Kxg::FileRecords& files)
-{
-    std::vector<Kxg::FileDigest> wanted;
-    for (const Kxg::DicomFileRecord& file : files.dicom)
-        wanted.push_back({file.path, file.stamp, {}, false});
-    for (const Kxg::VolumeFileRecord& file : files.volumes)
-        wanted.push_back({file.path, file.stamp, {}, true});
-    return digestRegistered(mCatalogue, std::move(wanted));
+    return registered.good() ? digestRegistered(mCatalogue, files) : registered;
 }
 
 Result Registration::flushUndigested()

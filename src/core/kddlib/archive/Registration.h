@@ -43,8 +43,6 @@ public:
     int volumes() const { return mVolumes; }
 
 private:
-    Result digest(const Kxg::FileRecords& files);
-
     Kxg::Catalogue& mCatalogue;
     Kxg::FileRecords mBatch;
     QHash<QByteArray, QVector<qint64>> mRequests;

@@ -11,7 +11,6 @@
 #include "platform/base/LogFile.h"
 #include "platform/os/FileStatus.h"
 #include "platform/os/PathName.h"
-#include "platform/resources/ExResource.h"
 
 #include <unistd.h>
 
@@ -76,17 +75,8 @@ bool StudyStacker::run()
         return isDone;
     mIsChanged = true;
     Kxg::RegistrationOutcome outcome;
-    return succeeded(mCatalogue.registerFiles(mMade, outcome)) && succeeded(digestMade()) && isDone;
-}
-
-Result StudyStacker::digestMade()
-{
-    if (!ExResource::takesFileDigests())
-        return {};
-    std::vector<Kxg::FileDigest> wanted;
-    for (const Kxg::VolumeFileRecord& file : mMade.volumes)
-        wanted.push_back({file.path, file.stamp, {}, true});
-    return digestRegistered(mCatalogue, std::move(wanted));
+    return succeeded(mCatalogue.registerFiles(mMade, outcome)) &&
+           succeeded(digestRegistered(mCatalogue, mMade)) && isDone;
 }
 
 /// What a process that died while it wrote has left. The claim says that nobody writes there now.

@@ -48,7 +48,6 @@ public:
 
 private:
     bool run();
-    Result digestMade();
     void removeUnfinished() const;
     bool stackSeries(const QByteArray& seriesUID, const TagMap& series);
     bool clearSeries(const QByteArray& seriesUID, const TagMap& series, bool& isStacked);

@@ -8,8 +8,6 @@
 
 #include <dcmtk/ofstd/ofcond.h>
 
-#include <memory>
-
 class DcmFileFormat;
 
 namespace Kdd
@@ -28,7 +26,7 @@ bool takePlain(const QByteArray& path, PlainRead read, DicomInput& input);
 void takeParsed(DicomInput& input, bool hasPrefix, const OFCondition& condition, DcmFileFormat& format);
 
 /// Says in `input` what a volume file is; `mesh` is null when it cannot be read, as `result` says.
-void takeVolume(DicomInput& input, const std::unique_ptr<OrlanMesh>& mesh, const Result& result);
+void takeVolume(DicomInput& input, const OrlanMesh* mesh, const Result& result);
 
 /// What `readDicomInput` makes of a file of whatever form, by DCMTK's parser.
 DicomInput parseInput(const QByteArray& path, Damage damage);
