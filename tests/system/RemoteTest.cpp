@@ -114,7 +114,10 @@ TEST_F(Remote, StudiesAreWhatTheyAreFromLocalFiles)
     EXPECT_EQ(again.number("studies"), 0);
     EXPECT_EQ(kdd("build --all --again").exitCode, 0);
     expectSame("built from all their files");
-    EXPECT_EQ(kdd("verify --all").exitCode, 0);
+    const Answer deep = kdd("verify --all --deep --record --json");
+    EXPECT_EQ(deep.exitCode, 0) << deep.err.toStdString();
+    EXPECT_EQ(deep.number("recorded"), 0) << "their servers know their bytes";
+    EXPECT_GT(deep.number("undigested"), 0);
     EXPECT_EQ(kdd("build --restored --json").exitCode, 0) << "the server is asked, not the disk";
 }
 
