@@ -76,7 +76,12 @@ class Client:
                                                               context=self.all.context)
             self.connection.request(method, path, body, headers)
             answer = self.connection.getresponse()
-            return answer.status, answer.headers, answer.read()
+            content = answer.read()
+            if answer.status >= 500:
+                # nginx reads no further request from where an upload broke off, and does not say so.
+                self.connection.close()
+                self.connection = None
+            return answer.status, answer.headers, content
         except (OSError, http.client.HTTPException) as fault:
             self.connection = None
             return 0, {}, repr(fault).encode()
