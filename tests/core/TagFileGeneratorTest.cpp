@@ -1,13 +1,18 @@
 #include "kddlib/TagFileGenerator.h"
 
 #include "core/tagfile/ArchiveFixture.h"
+#include "kddlib/Limits.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/volumes/Volume.h"
 #include "support/HttpServer.h"
 #include "support/LogCapture.h"
+#include "support/RandomImages.h"
 
 #include <QImage>
+
+#include <functional>
+#include <tuple>
 
 namespace Kdd
 {
@@ -211,6 +216,71 @@ TEST_F(GeneratorTest, VolumesAreFetchedFromTheirUrls)
     ASSERT_TRUE(build(file));
     EXPECT_EQ(file.seriesByUID().first()->volumes().size(), 1);
     EXPECT_EQ(log.count("Reading " + server.url("/gone.vol") + " failed: HTTP response code 404"), 1);
+}
+
+/// Whatever came in whatever order, and what was put in and taken out again meanwhile.
+TEST_F(GeneratorTest, WhatIsLoadedAlreadyMakesTheSameFile)
+{
+    RandomImages random(7);
+    std::vector<QByteArray> names;
+    for (int i = 10; i < 40; ++i) {
+        names.push_back(QByteArray::number(i));
+        delete random.next(names.back());
+        save(random.last(), names.back());
+    }
+    const QByteArray study = studies().first();
+    const auto load = [&](TagFile& into, const QByteArray& name) {
+        DcmFileFormat file;
+        EXPECT_TRUE(file.loadFile(path(name).constData()).good());
+        std::unique_ptr<TagMap> image(TagMap::createTagMap(file.getDataset(), kDefaultValueBound));
+        EXPECT_NE(TagFileGenerator::place(into, std::move(image), path(name)), nullptr);
+    };
+    const auto inOrder = [&](TagFile& into) {
+        for (const QByteArray& name : names)
+            load(into, name);
+    };
+    const auto fileBuiltWith = [&](TagFile& loaded) {
+        std::vector<Kxg::StudySummary> list;
+        EXPECT_TRUE(mCatalogue->listStudies(list).good());
+        TagFile built;
+        EXPECT_TRUE(TagFileGenerator().createTagFile(built, list.front().id, study.constData(), loaded));
+        QFile file(TagFile::cacheFilePathForStudy(study.constData()));
+        EXPECT_TRUE(file.open(QIODevice::ReadOnly));
+        return file.readAll();
+    };
+    TagFile nothing;
+    const QByteArray expected = fileBuiltWith(nothing);
+    const char* first[] = {names.front().constData()};
+    const std::tuple<const char*, bool, std::function<void(TagFile&)>> cases[] = {
+        {"all, in their order", true, inOrder},
+        {"backwards", false,
+         [&](TagFile& into) {
+             for (auto name = names.rbegin(); name != names.rend(); ++name)
+                 load(into, *name);
+         }},
+        {"the first replaced", false,
+         [&](TagFile& into) {
+             inOrder(into);
+             load(into, names.front());
+         }},
+        {"the first taken out and put back", false,
+         [&](TagFile& into) {
+             inOrder(into);
+             into.removeImages(1, first);
+             load(into, names.front());
+         }},
+        {"without the first", false,
+         [&](TagFile& into) {
+             inOrder(into);
+             into.removeImages(1, first);
+         }},
+    };
+    for (const auto& [what, isTakenOver, fill] : cases) {
+        TagFile loaded;
+        fill(loaded);
+        EXPECT_EQ(fileBuiltWith(loaded), expected) << what;
+        EXPECT_EQ(loaded.isEmpty(), isTakenOver) << what;
+    }
 }
 
 TEST_F(GeneratorTest, ADatabaseThatCannotAnswerFailsTheBuild)

@@ -39,6 +39,9 @@ public:
         return map;
     }
 
+    /// What the image made last was made from.
+    const DatasetBuilder& last() const { return mLast; }
+
     /// Changes any of the attributes and items, in as many steps.
     void change(int steps)
     {

@@ -124,6 +124,25 @@ bool StudySources::isListed(const TagMap& image, const QByteArray& path) const
            (listed->seriesUID.isEmpty() || image.uid(TagMap::SeriesLevel) == listed->seriesUID);
 }
 
+/// Of an image that was replaced or taken out its place among the others would still tell.
+bool StudySources::isLoadedWhole(const TagFile& loadedBefore) const
+{
+    const QVector<QByteArray>& added = loadedBefore.addedImages();
+    if (loadedBefore.studyInstanceUID() != corrections.studyUID() || !corrections.isEmpty() ||
+        !adopted->undecided().isEmpty() || added.size() != loadedBefore.imagesByUID().size() ||
+        static_cast<std::size_t>(added.size()) != dicomFiles.size())
+        return false;
+    for (int i = 0; i < added.size(); ++i) {
+        const TagMap* image = loadedBefore.findImage(added.at(i));
+        if (image == nullptr)
+            return false;
+        const QByteArray path = filePathOf(*image);
+        if (path != dicomFiles[static_cast<std::size_t>(i)].c_str() || !isListed(*image, path))
+            return false;
+    }
+    return true;
+}
+
 std::unique_ptr<TagMap> StudySources::copyFormer(const std::string& path) const
 {
     const QByteArray name = QByteArray::fromStdString(path);

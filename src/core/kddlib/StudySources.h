@@ -98,6 +98,10 @@ struct StudySources
     /// given other content since it was registered.
     bool isListed(const TagMap& image, const QByteArray& path) const;
 
+    /// Whether what was loaded before is what a build makes of the files and corrections: all of them, in the order of the
+    /// build, and nothing else.
+    bool isLoadedWhole(const TagFile& loadedBefore) const;
+
     /// What the present tag file has of the image listed for the file, as corrections make it; null when it has nothing
     /// of that.
     std::unique_ptr<TagMap> copyFormer(const std::string& path) const;

@@ -78,11 +78,12 @@ bool TagFileGenerator::createTagFile(int studyId)
 
 bool TagFileGenerator::createTagFile(TagFile& tagFile, int studyId, const char* studyInstanceUID)
 {
-    return createTagFile(tagFile, studyId, studyInstanceUID, TagFile());
+    TagFile nothing;
+    return createTagFile(tagFile, studyId, studyInstanceUID, nothing);
 }
 
 bool TagFileGenerator::createTagFile(TagFile& tagFile, int studyId, const char* studyInstanceUID,
-                                     const TagFile& loaded)
+                                     TagFile& loaded)
 {
     mLoadWatch = mVolumeWatch = mPreviewWatch = {};
     mNumKept = mNumMissing = 0;
@@ -92,7 +93,10 @@ bool TagFileGenerator::createTagFile(TagFile& tagFile, int studyId, const char* 
     StudySources sources(loaded);
     if (!sources.collect(mUser, studyId))
         return false;
-    addFiles(tagFile, studyInstanceUID, sources);
+    if (sources.isLoadedWhole(loaded))
+        tagFile.takeTree(loaded);
+    else
+        addFiles(tagFile, studyInstanceUID, sources);
     addVolumes(tagFile, sources.volumeFiles, sources);
     // After the volumes, because an image that a volume shows gets no preview of its own.
     QList<QByteArray> chosen;

@@ -54,8 +54,9 @@ public:
     /// built.
     bool createTagFile(TagFile& tagFile, int studyId, const char* studyInstanceUID);
 
-    /// The same, but files whose images `loaded` holds, by their paths in (0006,7100), are not loaded again.
-    bool createTagFile(TagFile& tagFile, int studyId, const char* studyInstanceUID, const TagFile& loaded);
+    /// The same, but files whose images `loaded` holds, by their paths in (0006,7100), are not loaded again. Where it is the
+    /// study already, as it would be built, it is taken over and empty afterwards.
+    bool createTagFile(TagFile& tagFile, int studyId, const char* studyInstanceUID, TagFile& loaded);
 
     /// The same on a tag file of its own.
     bool createTagFile(int studyId);

@@ -104,7 +104,8 @@ CompletedStudy StudyCompletion::reduce(Kxg::StudyClaim& claim)
         !present.readWhenFreeForStudy(studyUID.constData(), true) || !holdsListed(TagFile(), present)) {
         // Held alone so far; the build takes the lock itself.
         present.close();
-        return build(claim, TagFile());
+        TagFile nothing;
+        return build(claim, nothing);
     }
     // Whatever is not listed goes, so that a removal that died half way is completed as well.
     const std::vector<QByteArray> gone = unlisted(present);
@@ -132,7 +133,8 @@ CompletedStudy StudyCompletion::build(Kxg::StudyClaim& claim)
         known = read(claim);
     if (known.bad())
         return {known, false, {}};
-    return mContents.images.empty() ? remove(claim) : build(claim, TagFile());
+    TagFile nothing;
+    return mContents.images.empty() ? remove(claim) : build(claim, nothing);
 }
 
 /// What was requested up to now is seen by what is read after it.
@@ -157,7 +159,7 @@ CompletedStudy StudyCompletion::remove(Kxg::StudyClaim& claim)
 }
 
 /// What is loaded already spares the build the reading of those files.
-CompletedStudy StudyCompletion::build(Kxg::StudyClaim& claim, const TagFile& loaded) const
+CompletedStudy StudyCompletion::build(Kxg::StudyClaim& claim, TagFile& loaded) const
 {
     TagFile whole;
     const QByteArray& studyUID = claim.studyInstanceUID();

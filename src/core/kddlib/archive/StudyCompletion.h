@@ -64,7 +64,7 @@ public:
 
 private:
     static CompletedStudy remove(Kxg::StudyClaim& claim);
-    CompletedStudy build(Kxg::StudyClaim& claim, const TagFile& loaded) const;
+    CompletedStudy build(Kxg::StudyClaim& claim, TagFile& loaded) const;
     bool canMerge(const QByteArray& studyUID, TagFile& arrivals, const QVector<qint64>& requests,
                   TagFile& present) const;
     bool bringListed(const QByteArray& studyUID, TagFile& arrivals, const TagFile& present) const;

@@ -55,6 +55,7 @@ TagMap* StudyTree::add(TagMap* map, const char* path, bool replace)
     // What another series and study said of themselves is not the image's to bring along.
     dropOfTheNode(*image);
     mImages.insert(key, image.get());
+    mAdded.append(key);
     placeInSeries(image.get(), seriesUID, studyUID);
     if (path != nullptr)
         image->putAndInsertValue(kFileSuffix, VrCode::LO, extractSuffix(givenPath.constData()));
@@ -230,6 +231,7 @@ void StudyTree::clear()
 {
     mSeries.clear();
     mImages = {};
+    mAdded.clear();
     mStudies.clear();
 }
 

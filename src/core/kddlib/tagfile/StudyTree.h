@@ -3,6 +3,7 @@
 #include <QByteArray>
 #include <QHash>
 #include <QMap>
+#include <QVector>
 
 #include <memory>
 
@@ -62,6 +63,9 @@ public:
     /// held, when the image is there already and `replace` is false, or when it has neither SOP Instance UID nor path.
     /// `path` may be null; it gives the image's file name suffix. A map that the tree holds already stays.
     TagMap* add(TagMap* map, const char* path, bool replace);
+
+    /// The keys of all images that were added, in their order; also of those that have been replaced or removed since.
+    const QVector<QByteArray>& added() const { return mAdded; }
 
     /// For who makes the nodes himself, as readers do: each enters a node that hangs in its place already. What the
     /// index had under that name before is only forgotten.
@@ -144,6 +148,7 @@ private:
     Studies mStudies;
     Nodes mSeries;
     ImageIndex mImages;
+    QVector<QByteArray> mAdded;
 };
 
 }  // namespace Kdd

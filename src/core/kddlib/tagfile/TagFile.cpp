@@ -141,6 +141,12 @@ void TagFile::clear()
     d->study.clear();
 }
 
+void TagFile::takeTree(TagFile& other)
+{
+    d->tree() = std::move(other.d->tree());
+    other.clear();
+}
+
 bool TagFile::isEmpty() const
 {
     return d->tree().isEmpty();
@@ -164,6 +170,11 @@ const QMap<QByteArray, TagMap*>& TagFile::seriesByUID() const
 const QMap<QByteArray, TagMap*>& TagFile::imagesByUID() const
 {
     return d->tree().images();
+}
+
+const QVector<QByteArray>& TagFile::addedImages() const
+{
+    return d->tree().added();
 }
 
 TagFile::Statistics TagFile::statistics() const

@@ -92,6 +92,10 @@ public:
     /// Places every attribute where it costs the fewest bytes.
     void optimizeAll();
 
+    /// Takes over the study of another object, in place of the one held; that one is empty then. Files held open stay with
+    /// whom they are.
+    void takeTree(TagFile& other);
+
     void clear();
     bool isEmpty() const;
 
@@ -101,6 +105,10 @@ public:
 
     const QMap<QByteArray, TagMap*>& seriesByUID() const;
     const QMap<QByteArray, TagMap*>& imagesByUID() const;
+
+    /// The names by which `imagesByUID` knows the images that were added to this object, in the order in which they were; also of
+    /// those that have been replaced or removed since. Empty after reading a file.
+    const QVector<QByteArray>& addedImages() const;
 
     /// Counts of the present tree, and times [ms] and sizes [bytes] of its last optimisation, reading and writing.
     struct Statistics

@@ -23,6 +23,9 @@ public:
     /// The study's own; empty when the database has no such study.
     const QByteArray& studyUID() const { return mStudyUID; }
 
+    /// Whether no image that is or was in the study was ever corrected.
+    bool isEmpty() const { return mCorrections.empty(); }
+
     /// Null when the image, as its file has it, was never corrected. Owned by this object.
     const Kxg::ImageCorrection* find(const ImageIdentity& identity) const;
 
