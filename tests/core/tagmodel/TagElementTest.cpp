@@ -202,6 +202,12 @@ TEST(VrCode, NumbersAreThoseThatTagFilesHold)
         const auto evr = static_cast<DcmEVR>(number);
         EXPECT_TRUE(evrOf(vrCodeOf(evr)) == evr || hasSeveralVrs(vrCodeOf(evr))) << number;
     }
+    // Nor is it told otherwise than the dictionary tells, also where that is not asked.
+    for (const DcmTagKey& key :
+         {DcmTagKey(DCM_PixelData), DCM_PatientName, DCM_RedPaletteColorLookupTableData,
+          DcmTagKey(0x0009, 0x0000), DcmTagKey(0x0009, 0x0010), DcmTagKey(0x0009, 0x00ff),
+          DcmTagKey(0x0009, 0x1001), DcmTagKey(0x6002, 0x3000), DcmTagKey(0x4444, 0x0001)})
+        EXPECT_EQ(dictionaryEvr(key), DcmTag(key).getEVR()) << key.toString();
     for (const quint32 none : {44U, 63U, 254U, 255U, 0xffffffffU})
         EXPECT_STREQ(vrName(static_cast<VrCode>(none)), "??");
 }

@@ -1,5 +1,7 @@
 #include "kddlib/items/JsonForm.h"
 
+#include "kddlib/tagmodel/VrCode.h"
+
 #include <QtEndian>
 
 #include <dcmtk/dcmdata/dcdeftag.h>
@@ -257,7 +259,7 @@ void JsonForm::element(QByteArray& out, DcmElement& element, const char* /*creat
 void JsonForm::beginOmitted(QByteArray& out, const AttributeName& name) const
 {
     // The value's own VR went with it.
-    appendOpening(out, name.key, DcmVR(DcmTag(name.key).getEVR()).getValidVRName());
+    appendOpening(out, name.key, DcmVR(dictionaryEvr(name.key)).getValidVRName());
     out.append(R"(,"BulkDataURI":")");
 }
 

@@ -125,12 +125,8 @@ std::unique_ptr<DcmElement> bytesElement(VrCode vr, const DcmTag& tag, const QBy
 /// an unknown tag would have DCMTK write words as nothing and sequences as bytes.
 DcmTag TagElement::tagFor(const DcmTagKey& key) const
 {
-    // To load the dictionary takes as long as all else that a process does for one image.
-    if (!hasSeveralVrs(mVr))
-        return DcmTag(key, evrOf(mVr));
-    DcmTag known(key);
-    const bool isThis = known.getEVR() != EVR_UNKNOWN && vrCodeOf(known.getEVR()) == mVr;
-    return isThis ? known : DcmTag(key, evrOf(mVr));
+    const DcmEVR known = hasSeveralVrs(mVr) ? dictionaryEvr(key) : EVR_UNKNOWN;
+    return DcmTag(key, known != EVR_UNKNOWN && vrCodeOf(known) == mVr ? known : evrOf(mVr));
 }
 
 DcmElement* TagElement::createDcmElement(const DcmTagKey& key) const

@@ -1,5 +1,8 @@
 #include "kddlib/tagmodel/VrCode.h"
 
+#include <dcmtk/dcmdata/dcdeftag.h>
+#include <dcmtk/dcmdata/dctag.h>
+
 #include <array>
 #include <iterator>
 
@@ -61,6 +64,16 @@ DcmEVR evrOf(VrCode code)
 bool hasSeveralVrs(VrCode code)
 {
     return code == VrCode::UT || code == VrCode::Ox || code == VrCode::UN;
+}
+
+DcmEVR dictionaryEvr(const DcmTagKey& key)
+{
+    if (key == DCM_PixelData)
+        return EVR_px;
+    // Of these it knows by themselves no more than how long their group is, and their creators.
+    if (key.getGroup() % 2 != 0 && key.getElement() > 0xff)
+        return EVR_UNKNOWN;
+    return DcmTag(key).getEVR();
 }
 
 const char* vrName(VrCode code)

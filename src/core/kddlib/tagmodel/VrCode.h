@@ -6,6 +6,7 @@
 
 #include <dcmtk/config/osconfig.h>
 
+#include <dcmtk/dcmdata/dctagkey.h>
 #include <dcmtk/dcmdata/dcvr.h>
 
 namespace Kdd
@@ -68,6 +69,11 @@ KDD_EXPORT DcmEVR evrOf(VrCode code);
 
 /// Whether DCMTK's VRs of values with that code differ, so that `evrOf` is one of several.
 KDD_EXPORT bool hasSeveralVrs(VrCode code);
+
+/// The VR that DCMTK's dictionary has for an attribute whose private creator is not known; EVR_UNKNOWN when it has none, as of
+/// private ones. To load the dictionary takes as long as some hundred images, so it is asked only where nothing else
+/// tells.
+KDD_EXPORT DcmEVR dictionaryEvr(const DcmTagKey& key);
 
 /// DCMTK's name of the VR ("PN", "ox", ...), and its name for an unknown one ("??").
 KDD_EXPORT const char* vrName(VrCode code);
