@@ -92,11 +92,10 @@ def main():
     beneath = wanted.folder or ("/dev/shm" if os.access("/dev/shm", os.W_OK) else None)
     folder = tempfile.mkdtemp(prefix="kddpower", dir=beneath)
     site = PowerSite(os.path.abspath(wanted.kdd), folder, "sqlite")
+    operations = [each for each in COMMANDS if wanted.operation is None or each.name in wanted.operation]
     for is_flushed in (True, False) if wanted.flush is None else (wanted.flush,):
-        print("with --flush" if is_flushed else "without --flush", flush=True)
-        for operation in COMMANDS:
-            if wanted.operation is None or operation.name in wanted.operation:
-                faults += run(Command(site, operation, is_flushed), operation.name, wanted)
+        for operation in operations:
+            faults += run(Command(site, operation, is_flushed), operation.name + (" --flush" if is_flushed else ""), wanted)
     if wanted.operation is None or "arrival" in wanted.operation:
         faults += run(Arrival(site, not wanted.journaled), "arrival", wanted)
     shutil.rmtree(folder)
