@@ -42,10 +42,10 @@ OPERATIONS = [
     Operation("add", ["index NOTHING"], "add DAY"),
     Operation("index", ["index NOTHING"], "index DAY"),
     Operation("build", ["index DAY"], "build"),
-    Operation("merge", ["add FIRST"], "add DAY"),
-    Operation("settle", ["add FIRST", "add DAY"], "build --settle"),
+    Operation("merge", ["add MOST"], "add DAY"),
+    Operation("settle", ["add MOST", "add DAY"], "build --settle"),
     Operation("rebuild", ["add DAY"], "build --all --again"),
-    Operation("stack", ["add DAY"], "stack --again"),
+    Operation("stack", ["UNSTACK", "add DAY"], "stack --again"),
     Operation("sync", ["add FIRST", "index DAY"], "sync STUDY"),
     Operation("edit", ["add DAY"], "qa EDIT --study STUDY --image IMAGE --image IMAGE2"),
     Operation("move", ["add DAY"], "qa MOVE --study OTHER --image IMAGE --image IMAGE2"),
@@ -68,13 +68,15 @@ class Site:
         if database == "postgresql":
             self.postgres, address = start_postgres(folder)
             self.admin = address.replace("/kdd?", "/postgres?")
-        self.environment = dict(os.environ, KDD_STORE=self.store, KDD_DATABASE=address, KDD_SETTLE_SECONDS="0",
+        self.environment = dict(os.environ, KDD_STORE=self.store, KDD_DATABASE=address, KDD_SETTLE_SECONDS="3600",
                                 LC_ALL="C.UTF-8")
         self.original = os.path.join(folder, "original")
         self.run("sample", os.path.join(folder, "sample"), "--images", "6", "--seed", "5", "--quiet")
         for study in ("CT-1", "MR-1"):
             shutil.copytree(os.path.join(folder, "sample", study), os.path.join(self.original, study))
-        self.words = {"DAY": self.day, "FIRST": os.path.join(self.day, "CT-1/2"), "NOTHING": os.path.join(folder, "nothing")}
+        self.words = {"DAY": self.day, "FIRST": os.path.join(self.day, "CT-1/2"),
+                      # Of a study without volumes, so that the rest is merged.
+                      "MOST": os.path.join(self.day, "MR-1/1"), "NOTHING": os.path.join(folder, "nothing")}
         os.mkdir(self.words["NOTHING"])
         self.restore_files()
         self.run("add", self.day, "--quiet")
@@ -106,17 +108,24 @@ class Site:
         if self.postgres:
             self.sql("DROP DATABASE kdd WITH (FORCE)", "CREATE DATABASE kdd")
         for command in operation.before:
-            if command == "CHANGE":
-                self.change_file()
-            elif command == "REMOVE":
-                os.unlink(self.some_file())
-            elif self.run(*self.arguments(command)).returncode != 0:
-                raise SystemExit(f"{operation.name} cannot begin: {command} fails")
+            self.prepare(command)
         shutil.rmtree(self.kept, ignore_errors=True)
         os.makedirs(self.store, exist_ok=True)
         shutil.copytree(self.store, self.kept)
         if self.postgres:
             self.sql("DROP DATABASE IF EXISTS kept WITH (FORCE)", "CREATE DATABASE kept TEMPLATE kdd")
+
+    def prepare(self, command):
+        if command == "CHANGE":
+            self.change_file()
+        elif command == "UNSTACK":
+            # What others have stacked is not stacked again.
+            for path in glob.glob(self.day + "/*/*/*.vol"):
+                os.unlink(path)
+        elif command == "REMOVE":
+            os.unlink(self.some_file())
+        elif self.run(*self.arguments(command)).returncode != 0:
+            raise SystemExit(f"{command} fails, which has to be done before")
 
     def some_file(self):
         return os.path.join(self.day, "CT-1/2/IM0002.dcm")

@@ -79,7 +79,8 @@ TEST(ThreadsPage, TellsOfEveryClassThatIsExportedAndSoDoesItsHeader)
     EXPECT_EQ(told, exported);
 }
 
-TEST(ThreatsPage, NamesForEachThreatATestThatIsThere)
+/// The tests that there are, "Suite.Name".
+std::set<std::string> testsThere()
 {
     std::set<std::string> there;
     for (const auto& [path, text] : sources(QStringLiteral("tests"))) {
@@ -88,15 +89,50 @@ TEST(ThreatsPage, NamesForEachThreatATestThatIsThere)
             there.insert(name);
         }
     }
-    const QString page = pageText(QStringLiteral("docs/threats.md"));
+    return there;
+}
+
+/// Those that the page names and that are not there.
+std::set<std::string> testsMissing(const QString& page)
+{
+    const std::set<std::string> there = testsThere();
     std::set<std::string> missing;
     for (const std::string& named : matches(page, "`(\\w+\\.\\w+)`")) {
         if (there.count(named) == 0)
             missing.insert(named);
     }
-    EXPECT_EQ(missing, std::set<std::string>());
+    return missing;
+}
+
+TEST(ThreatsPage, NamesForEachThreatATestThatIsThere)
+{
+    const QString page = pageText(QStringLiteral("docs/threats.md"));
+    EXPECT_EQ(testsMissing(page), std::set<std::string>());
     EXPECT_EQ(matches(page, "^(\\| [^*`|]+ \\| [^|]+ \\|) [^`|]*\\|$"),
               std::set<std::string>{"| threat | what stands against it |"});
+}
+
+TEST(LimitsPage, HasForEachLimitATestOrAtLeastItsNumberInTheSource)
+{
+    const std::set<std::string> limits =
+        matches(pageText(QStringLiteral("docs/limits.md")), "^\\| (?!what \\|)([^|]*[^-|][^|]*) \\|");
+    EXPECT_GT(limits.size(), 80U);
+    const QString page = pageText(QStringLiteral("docs/limits-held.md"));
+    EXPECT_EQ(matches(page, "^\\| (?!limit \\|)([^|]*[^-|][^|]*) \\|"), limits);
+    EXPECT_EQ(testsMissing(page), std::set<std::string>());
+    // Neither a test nor a number.
+    EXPECT_EQ(matches(page, "^\\| (?!limit \\|)([^|]+) \\|[^`]*$"), std::set<std::string>());
+    const std::map<QString, QString> code = sources();
+    for (const std::string& cell : matches(page, "(`src/[^|]*) \\|$")) {
+        for (const QString& file : QString::fromStdString(cell).split(QStringLiteral("; "))) {
+            const int colon = file.indexOf(QStringLiteral("`: "));
+            const QString path = file.mid(1, colon - 1);
+            ASSERT_EQ(code.count(path), 1U) << path.toStdString();
+            for (const std::string& number : matches(file.mid(colon + 2), "`([^`]+)`"))
+                EXPECT_TRUE(code.at(path).contains(QString::fromStdString(number)))
+                    << path.toStdString() << " has no " << number;
+        }
+    }
 }
 
 }  // namespace

@@ -25,16 +25,26 @@ QVariantList textsOf(const StudyLimit& limit)
     return list;
 }
 
+/// The term so many times, one of which has to hold. In groups, because engines take a chain of some hundred only.
+QByteArray oneOf(const QByteArray& term, int count)
+{
+    constexpr int kGroup = 100;
+    QByteArray groups;
+    for (int left = count; left > 0; left -= kGroup)
+        groups += (groups.isEmpty() ? "(" : " OR (") + term +
+                  (" OR " + term).repeated(qMin(left, kGroup) - 1) + ')';
+    return '(' + groups + ')';
+}
+
 /// Leaves out, without a look at what they say, most of the studies that are not meant.
 SearchSql marksSql(SearchSelection& selection, const SqlDialect& dialect, const StudyLimit& limit)
 {
     const QByteArray marks = selection.study("marks");
-    SearchSql any{'(' + marks + " = ?", {textValue(kAnyMark)}};
-    for (const QByteArray& line : limit.values) {
-        any.text += " OR " + dialect.wordsOf.arg(QLatin1String(marks)).toLatin1();
+    const QByteArray isMarkedSo = dialect.wordsOf.arg(QLatin1String(marks)).toLatin1();
+    SearchSql any{'(' + marks + " = ? OR " + oneOf(isMarkedSo, limit.values.size()) + ')',
+                  {textValue(kAnyMark)}};
+    for (const QByteArray& line : limit.values)
         any.values << textValue(dialect.pattern('*' + markOf(line) + '*'));
-    }
-    any.text += ')';
     return any;
 }
 
@@ -49,7 +59,7 @@ void addLimit(SearchSelection& selection, const SqlDialect& dialect, const Study
     if (isMarked(limit.attribute))
         selection.add(marksSql(selection, dialect, limit));
     const QByteArray holds = dialect.holds.arg(QLatin1String("l.attributes")).toLatin1();
-    const QByteArray holdsOne = '(' + holds + (" OR " + holds).repeated(further) + ')';
+    const QByteArray holdsOne = oneOf(holds, limit.values.size());
     const QByteArray ofStudy = " l WHERE l.study_id = " + selection.study("study_id") + " AND ";
     if (limit.of == StudyLimit::Of::Study)
         return selection.add(

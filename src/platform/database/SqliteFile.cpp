@@ -1,6 +1,7 @@
 #include "platform/database/SqliteFile.h"
 
 #include "platform/database/SqlConnection.h"
+#include "platform/os/StagedFile.h"
 
 #include <unistd.h>
 
@@ -17,9 +18,12 @@ void provide(const QString& path, Kdd::IfAbsent ifAbsent)
 {
     const std::filesystem::path file(path.toStdString());
     std::error_code error;
-    if (ifAbsent == Kdd::IfAbsent::Create)
-        std::filesystem::create_directories(file.parent_path(), error);
-    else if (!std::filesystem::exists(file, error) && !error)
+    // The engine flushes the names of its files, and nobody else those of the folders that it finds.
+    if (ifAbsent == Kdd::IfAbsent::Create) {
+        const Kdd::SystemResult made =
+            Kdd::makeLastingFolder(QByteArray::fromStdString(file.parent_path().string()));
+        error = std::error_code(made.error(), std::system_category());
+    } else if (!std::filesystem::exists(file, error) && !error)
         error = std::make_error_code(std::errc::no_such_file_or_directory);
     if (error)
         throw DatabaseError(QString::fromStdString(error.message()));

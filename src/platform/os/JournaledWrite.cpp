@@ -319,7 +319,8 @@ SystemResult removeWithJournal(QFile& locked, const QString& path)
         return result;
     }
     result = removeLocked(locked, path);
-    return result.good() ? result : failed("remove", path, result.error());
+    const int error = result.good() ? flushFolderOf(path) : result.error();
+    return error == 0 ? SystemResult() : failed("remove", path, error);
 }
 
 }  // namespace Kdd

@@ -62,7 +62,8 @@ SystemResult writeInPlace(QFile& locked, const QString& path, const QByteArray& 
 SystemResult recoverInterruptedWrite(QFile& locked, const QString& path, Flush flush);
 
 /// Deletes the file at `path` with its journal, which would otherwise bring the content back into the next file of
-/// that name, and closes `locked`.
+/// that name, and closes `locked`. The removal is flushed to the disk whatever is asked of writes: nobody would notice
+/// a file that is back after a loss of power, for what it was made of is known no more.
 SystemResult removeWithJournal(QFile& locked, const QString& path);
 
 }  // namespace Kdd

@@ -101,7 +101,7 @@ Result PartFile::state() const
 Result PartFile::publish()
 {
     // Not flushed to disk: a volume can be made again from its images, and one that a power loss has torn is known by
-    // its checksums.
+    // its checksums. Whoever promises more flushes what has its name.
     // Network file systems keep errors back until then.
     if (::close(std::exchange(mDescriptor, -1)) != 0)
         fail(errno);

@@ -17,7 +17,7 @@ using DicomWeb::SearchLevel;
 
 // What a question may ask for at most; as of searches over HTTP.
 constexpr int kMaxKeys = 1000;  // shown, in the items of sequences too
-constexpr int kMaxDepth = 8;    // of sequences inside each other
+constexpr int kMaxDepth = 8;    // attributes on the way to one, itself included
 
 // Below are commands, meta headers and our own.
 constexpr Uint16 kFirstGroup = 0x0008;

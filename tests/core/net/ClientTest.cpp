@@ -158,6 +158,26 @@ QByteArray redirectTo(const std::string& url)
            "\r\n\r\npage";
 }
 
+TEST_F(Client, FailsWhereHeadersAreLongerThanAnyServerNeeds)
+{
+    const struct
+    {
+        int lines;
+        int length;
+        bool isTaken;
+    } kHeaders[] = {{1, 90'000, true}, {1, 110'000, false}, {3, 90'000, true}, {4, 90'000, false}};
+    for (const auto& each : kHeaders) {
+        const LogCapture log;
+        const QByteArray line = "X-Long: " + QByteArray(each.length, 'x') + "\r\n";
+        const ScriptedServer talkative([&](const QByteArray&) {
+            return ScriptedServer::Reply{"HTTP/1.1 200 OK\r\nContent-Length: 2\r\n" +
+                                         line.repeated(each.lines) + "\r\nok"};
+        });
+        client.readBytes(talkative.url("x"), status);
+        EXPECT_EQ(status.failed, !each.isTaken) << each.lines << " of " << each.length << status.reason();
+    }
+}
+
 TEST_F(Client, FollowsRedirectsAndTellsOthersNothing)
 {
     ScriptedServer first([this](const QByteArray& request) -> ScriptedServer::Reply {

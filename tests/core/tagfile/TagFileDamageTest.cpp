@@ -106,6 +106,8 @@ const Body kBodies[] = {
     {"NestedFarTooDeep", study(nested(5000)), kRefused},
     {"TwoSeriesOfOneUid", kBelow + image("1") + series("s") + image("2"), kRefused},
     {"TwoImagesOfOneUid", kBelow + image("1") + image("2") + image("1"), 2},
+    {"AsManyReplacedAsAllowed", kBelow + image("1").repeated(kMaxReplacedImages + 1), 1},
+    {"TooManyReplaced", kBelow + image("1").repeated(kMaxReplacedImages + 2), kRefused},
     {"OneImageInTwoSeries", kBelow + image("1") + series("t") + image("1"), 1},
     {"ImageBeforeItsSeries", study() + image("1") + series("s") + image("2"), 1},
     {"SeriesBeforeItsStudy", series("s") + image("1") + kBelow + image("2"), 1},

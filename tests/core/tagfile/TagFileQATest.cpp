@@ -43,6 +43,15 @@ TEST(QAJobXml, IsReadByTheNamesOfItsElements)
     EXPECT_TRUE(job.parse("<Timestamp> </Timestamp>", message)) << "now";
 }
 
+QByteArray tooManyTags()
+{
+    QByteArray tags;
+    for (int i = 0; i <= kMaxSubstitutions; ++i)
+        tags +=
+            "<Tag Group='0018' Element='" + QByteArray::number(0x1000 + i, 16) + "'><Value>a</Value></Tag>";
+    return "<Substitutions>" + tags + "</Substitutions>";
+}
+
 const std::pair<QByteArray, const char*> kJobFaults[] = {
     {"", "Line 1"},
     {"<a>\n<b>", "Line 2"},
@@ -62,6 +71,7 @@ const std::pair<QByteArray, const char*> kJobFaults[] = {
     {"<Login>a\nb</Login>", "one line"},
     {"<a><Substitutions OldSUID='1'/><Substitutions OldSUID='2'/></a>", "second study, \"2\""},
     {"<!DOCTYPE a [<!ENTITY b 'bbbb'><!ENTITY c '&b;&b;'>]><Login>&c;</Login>", "document type"},
+    {tooManyTags(), "More than 1000 Tags"},
     {QByteArray(kMaxJobXml + 1, ' '), "longer than 1048576"},
 };
 

@@ -2,6 +2,7 @@
 #include "platform/volumefile/OrlanMesh.h"
 #include "platform/volumefile/SOPInstanceUtility.h"
 #include "platform/volumefile/VolumeFileBuilder.h"
+#include "platform/volumefile/VolumeFileFormat.h"
 
 #include <gtest/gtest.h>
 #include <hdf5.h>
@@ -156,6 +157,45 @@ std::function<void(hid_t)> parameter(hid_t type, hsize_t count)
 
 constexpr hsize_t kMany = 1 << 22;
 
+/// More members of a group than there may be, all of them one empty bundle.
+std::function<void(hid_t)> members(QByteArray group, int count)
+{
+    return [=](hid_t file) {
+        const hid_t one = H5Gcreate2(file, "Empty", H5P_DEFAULT, H5P_DEFAULT, H5P_DEFAULT);
+        for (int i = 0; i < count; ++i)
+            H5Lcreate_hard(file, "Empty", file, group + "/M" + QByteArray::number(i), H5P_DEFAULT,
+                           H5P_DEFAULT);
+        H5Gclose(one);
+        H5Ldelete(file, "Empty", H5P_DEFAULT);
+    };
+}
+
+/// Pixels of so many numbers, which say the same of themselves.
+void putComponents(hid_t file, std::int64_t count)
+{
+    const Dims dims = {2, 4, 4, static_cast<hsize_t>(count)};
+    putDataset(file, kLevel0, H5T_STD_U8LE, dims, compressed({1, 4, 4, dims[3]}));
+    const hid_t space = H5Screate(H5S_SCALAR);
+    const hid_t said = H5Acreate_by_name(file, kLevel0, VolumeFile::kComponentsAttribute, H5T_STD_I64LE,
+                                         space, H5P_DEFAULT, H5P_DEFAULT, H5P_DEFAULT);
+    H5Awrite(said, H5T_NATIVE_INT64, &count);
+    H5Aclose(said);
+    H5Sclose(space);
+}
+
+/// One number under more names than there may be parameters.
+void putParameters(hid_t file)
+{
+    const std::int64_t value = 7;
+    putDataset(file, "Parameters/Long", H5T_STD_I64LE, {1}, compressed({1}));
+    const hid_t dataset = H5Dopen2(file, "Parameters/Long", H5P_DEFAULT);
+    H5Dwrite(dataset, H5T_NATIVE_INT64, H5S_ALL, H5S_ALL, H5P_DEFAULT, &value);
+    H5Dclose(dataset);
+    for (int i = 0; i < VolumeFile::kMaxParameters; ++i)
+        H5Lcreate_hard(file, "Parameters/Long", file, "Parameters/P" + QByteArray::number(i), H5P_DEFAULT,
+                       H5P_DEFAULT);
+}
+
 const Hostile kHostile[] = {
     {"ClaimsPixelsThatAreNotThere", "slice 0: is not in the file",
      pixels(H5T_STD_U16LE, {9, 20'000, 20'000}, {1, 20'000, 20'000})},
@@ -193,6 +233,23 @@ const Hostile kHostile[] = {
      row("Parameters/Long", H5T_STD_I64LE, kMany, kMany)},
     {"TooManyCounts", "has 4194304 counts", row(kHistogram, H5T_STD_U64LE, kMany, kMany)},
     {"CountsOfAnotherType", "not one chunk of 64-bit counts", row(kHistogram, H5T_STD_I64LE, 9, 9)},
+    {"TooManyRootMembers", "64 are the most", members(".", 65)},
+    {"TooManyLattices", "64 are the most", members(VolumeFile::kLatticesGroup, 64)},
+    {"TooManyDataSections", "64 are the most", members(VolumeFile::kDataSectionsGroup, 65)},
+    {"TooManyBundles", "bundles are too many", members(VolumeFile::kParametersGroup, 1000)},
+    {"TooManyParameters", "is one of more than 20000 parameters", putParameters},
+    {"TooLongParameters", "makes the parameters longer than 67108864 bytes",
+     row("Parameters/Long", H5T_STD_I64LE, 1 << 24, 1 << 24)},
+    {"TooManyComponents", "has a wrong number of components", [](hid_t f) { putComponents(f, 17); }},
+    {"LongName", "has no proper name",
+     [](hid_t f) { H5Lcreate_hard(f, "Parameters", f, QByteArray(256, 'n'), H5P_DEFAULT, H5P_DEFAULT); }},
+    {"StoredChunkTooLong", "slice 2: claims 2000 bytes for 400",
+     [](hid_t f) {
+         const hsize_t start[] = {2, 0, 0};
+         const hid_t dataset = H5Dopen2(f, kLevel0, H5P_DEFAULT);
+         H5Dwrite_chunk(dataset, H5P_DEFAULT, 0, start, 2000, QByteArray(2000, 'x').constData());
+         H5Dclose(dataset);
+     }},
     {"LaterVersion", "format version",
      [](hid_t f) {
          H5Arename(f, "FormatVersion", "FormerVersion");

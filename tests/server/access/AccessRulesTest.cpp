@@ -1,5 +1,7 @@
 #include "server/access/AccessRules.h"
 
+#include "support/FileContent.h"
+
 #include <QTemporaryDir>
 
 #include <gtest/gtest.h>
@@ -130,6 +132,11 @@ TEST(AccessRules, NameTheFileThatIsNotThere)
     const QTemporaryDir folder;
     const QString path = folder.filePath(QStringLiteral("access.json"));
     EXPECT_TRUE(AccessRules::read(path, rules).text().startsWith(path));
+    const QByteArray text = R"({"anyone":["read"]})";
+    putFile(path, text.leftJustified(1024 * 1024, ' '));
+    EXPECT_TRUE(AccessRules::read(path, rules).good());
+    putFile(path, text.leftJustified(1024 * 1024 + 1, ' '));
+    EXPECT_TRUE(AccessRules::read(path, rules).text().contains(QLatin1String("too large")));
 }
 
 }  // namespace

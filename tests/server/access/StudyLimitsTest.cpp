@@ -185,6 +185,12 @@ TEST_F(StudyLimits, FollowTheClaim)
         }
         EXPECT_EQ(found.join(' ').toStdString(), each.studies);
     }
+    QJsonArray many;
+    for (int i = 0; i < 500; ++i)
+        many.append(QString::number(i));
+    EXPECT_EQ(ask("GET", "/dicom-web/studies", token(many)).status, 200);
+    many.append(QStringLiteral("North"));
+    EXPECT_EQ(ask("GET", "/dicom-web/studies", token(many)).status, 401);
     const Reply page = ask("GET", "/dicom-web/studies?limit=1", token(QStringLiteral("North")));
     EXPECT_EQ(page.header("Warning"), "") << "others are not counted";
     EXPECT_EQ(get("/dicom-web/patients", token(QStringLiteral("North"))).count("00201200"), 1);

@@ -160,6 +160,8 @@ std::vector<BadToken> badTokens()
          forged},
         {"WantsToBeUnderstood", headed(R"({"alg":"RS256","kid":"rsa","crit":["x"],"x":1})"), unreadable},
         {"ForLoggingOut", headed(R"({"alg":"RS256","kid":"rsa","typ":"logout+jwt"})"), unreadable},
+        {"KeyNameIsLong", headed(TokenIssuer::header("RS256", QByteArray(257, 'x').constData())), unreadable},
+        {"Long", with("more", QString(13 * 1024, QLatin1Char('x'))), unreadable},
         {"KeyNameIsANumber", headed(R"({"alg":"RS256","kid":1})"), unreadable},
         {"HeaderSaidTwice", headed(R"({"alg":"none","alg":"RS256","kid":"rsa"})"), unreadable},
         {"ClaimSaidTwice", saying(R"({"sub":"anna",)" + body.mid(1)), unreadable},
@@ -288,6 +290,16 @@ TEST(TokenKeys, AreOnlyThoseThatSignWell)
             << TokenIssuer::text(key).toStdString();
         EXPECT_EQ(result.text(), QStringLiteral("it has no key for RS256 or ES256"));
     }
+    // What stands behind the hundredth is not looked at.
+    QJsonArray many;
+    for (int i = 0; i < 100; ++i)
+        many.append(changed(ec, "kid", QString::number(i)));
+    many.append(rsa);
+    const QByteArray set = QJsonDocument(QJsonObject{{QStringLiteral("keys"), many}}).toJson();
+    const auto keys = TokenKeys::read(set, result);
+    ASSERT_NE(keys, nullptr);
+    EXPECT_TRUE(keys->has("99", Algorithm::ES256));
+    EXPECT_FALSE(keys->has("rsa", Algorithm::RS256));
     // Of two by one name nobody knows which is meant.
     EXPECT_FALSE(TokenKeys::read(TokenIssuer::keySet({rsa, rsa}), result)->has("rsa", Algorithm::RS256));
 }

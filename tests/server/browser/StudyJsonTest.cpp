@@ -1,5 +1,8 @@
+#include "server/browser/StudyJson.h"
+
 #include "BrowserFixture.h"
 #include "server/browser/AttributeTree.h"
+#include "server/browser/Difference.h"
 #include "server/browser/ShownValue.h"
 
 #include <kddlib/OwnAttributes.h>
@@ -152,6 +155,28 @@ TEST_F(BrowserTest, CutsWhatIsTooMuchAndSaysSo)
     const QJsonObject value = entry(tree[QStringLiteral("attributes")], "0040A160");
     EXPECT_EQ(value[QStringLiteral("value")].toString().size(), kMaxValueLength);
     EXPECT_EQ(value[QStringLiteral("length")].toInt(), kMaxValueLength + 500);
+}
+
+TEST_F(BrowserTest, GivesNoMoreAtOnceThanPeopleLookAt)
+{
+    DatasetBuilder full = anImage("1.4").inStudy("1.2").inSeries("1.3");
+    for (unsigned short i = 0; i < kMaxDifferences + 1; ++i)
+        full.with(
+            DcmTag(i < 0x1000 ? 0x0018 : 0x0020, static_cast<unsigned short>(0x8000 + i % 0x1000), EVR_LO),
+            "value");
+    TagFile file;
+    file.addTagMap(full.map(), nullptr, true);
+    // In a series of their own: what many images of one have to tell apart takes its time.
+    for (int i = 0; i <= kMaxListedImages; ++i)
+        file.addTagMap(anImage(("1.5." + std::to_string(i)).c_str()).inStudy("1.2").inSeries("1.6").map(),
+                       nullptr, true);
+    ASSERT_TRUE(file.writeCacheFile());
+    const QJsonObject listed = json("/browser/studies/1.2/series/1.6/images?limit=5000");
+    EXPECT_EQ(listed[QStringLiteral("images")].toArray().size(), kMaxListedImages);
+    EXPECT_EQ(listed[QStringLiteral("count")].toInt(), kMaxListedImages + 1);
+    const QJsonObject found = json("/browser/studies/1.2/difference?a=1.4&b=1.5.1");
+    EXPECT_EQ(found[QStringLiteral("differences")].toArray().size(), kMaxDifferences);
+    EXPECT_FALSE(found[QStringLiteral("complete")].toBool(true));
 }
 
 TEST_F(BrowserTest, DecodesTextsByTheCharacterSetOfTheirImage)

@@ -1,5 +1,6 @@
 #include "server/PeersFile.h"
 #include "server/dimse/DimseFixture.h"
+#include "server/dimse/PduGuard.h"
 
 using namespace Kdd;
 
@@ -156,6 +157,25 @@ TEST_F(AssociationTest, SurvivesWhatNobodyShouldSend)
         EXPECT_TRUE(answer.isEmpty() || answer.at(0) == 7) << hostile.name << answer.toHex().constData();
         EXPECT_EQ(store(anImage()), 0) << hostile.name;
     }
+}
+
+TEST(AssociationRequest, HoldsNotMoreOfAnythingThanThereMayBe)
+{
+    const auto isTaken = [](int contexts, int syntaxes, int items) {
+        QByteArray request = RawCaller::request(
+            QVector<RawCaller::Offer>(contexts, {kCapture, QVector<QByteArray>(syntaxes, kExplicit)}));
+        // The information about the user stands last, with two items of its own.
+        const int user = request.lastIndexOf(QByteArray("\x50\x00", 2));
+        request += QByteArray("\x57\0\0\0", 4).repeated(items - 2);
+        qToBigEndian(static_cast<quint16>(request.size() - user - 4), request.data() + user + 2);
+        return Dimse::isWellFormedRequest(request.constData(), request.size());
+    };
+    EXPECT_TRUE(isTaken(128, 1, 2));
+    EXPECT_FALSE(isTaken(129, 1, 2));
+    EXPECT_TRUE(isTaken(1, 50, 2));
+    EXPECT_FALSE(isTaken(1, 51, 2));
+    EXPECT_TRUE(isTaken(1, 1, 1000));
+    EXPECT_FALSE(isTaken(1, 1, 1001));
 }
 
 TEST_F(AssociationTest, SurvivesEveryDamagedRequest)

@@ -136,6 +136,19 @@ TEST_F(CommitmentTest, RefusesWhatItCannotUnderstand)
         {level.repeated(100000), 0x0115}, {QByteArray(5000000, '\0'), 0x0115}, {"xx", 0x0115}};
     for (const auto& [dataset, status] : hostile)
         EXPECT_EQ(askRaw(dataset, "CT1"), status) << dataset.size();
+    const QByteArray object("\xfe\xff\x00\xe0\x1a\0\0\0"
+                            "\x08\0\x50\x11\x04\0\0\0"
+                            "1.2\0"
+                            "\x08\0\x55\x11\x06\0\0\0"
+                            "1.2.3\0",
+                            8 + 26);
+    const QByteArray before("\x08\0\x95\x11\x04\0\0\0"
+                            "1.9\0"
+                            "\x08\0\x99\x11\xff\xff\xff\xff",
+                            20);
+    const QByteArray after("\xfe\xff\xdd\xe0\0\0\0\0", 8);
+    EXPECT_EQ(askRaw(before + object.repeated(20000) + after, "CT1"), 0);
+    EXPECT_EQ(askRaw(before + object.repeated(20001) + after, "CT1"), 0x0213);
     EXPECT_THAT(ask({QStringLiteral("1.2.3.1")}), HasSubstr("1.2.3.1 kept"));
 }
 

@@ -1,5 +1,9 @@
 #include "server/PeersFile.h"
 
+#include "support/FileContent.h"
+
+#include <QTemporaryDir>
+
 #include <gtest/gtest.h>
 
 using namespace Kdd;
@@ -53,6 +57,18 @@ TEST(PeersFileTest, IsRefusedForEverySlipWithItsPlace)
             << slip.text << result.text().toStdString();
         EXPECT_FALSE(file.rules.anyone || !file.rules.peers.isEmpty()) << "nothing of it is in force";
     }
+}
+
+TEST(PeersFileTest, IsOfOneMebibyteAtMost)
+{
+    const QTemporaryDir folder;
+    const QString path = folder.filePath(QStringLiteral("peers.json"));
+    const QByteArray text = R"({"anyone": ["store"]})";
+    PeersFile file;
+    putFile(path, text.leftJustified(1024 * 1024, ' '));
+    EXPECT_TRUE(PeersFile::read(path, file).good());
+    putFile(path, text.leftJustified(1024 * 1024 + 1, ' '));
+    EXPECT_TRUE(PeersFile::read(path, file).text().contains(QLatin1String("too large")));
 }
 
 }  // namespace

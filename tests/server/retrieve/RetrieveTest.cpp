@@ -79,6 +79,9 @@ TEST_F(RetrieveTest, RefusesWhatIsNotThereOrCannotBeGiven)
     add("a.dcm", anImageWithFrames(2));
     for (const Refusal& row : kRefusals)
         EXPECT_EQ(get(QByteArray(kInstance) + row.path, row.accept).status, row.status) << row.path;
+    const QByteArray most = kInstance + QByteArray("/frames/1") + QByteArray(",1").repeated(9999);
+    EXPECT_EQ(get(most, "*/*").status, 200);
+    EXPECT_EQ(get(most + ",1", "*/*").status, 400);
     EXPECT_EQ(get("studies/1.9").status, 404);
     EXPECT_EQ(get("studies/1.2/series/1.9").status, 404);
     EXPECT_EQ(get("studies/1.2/series/1.9/instances/1.2.3.1").status, 404) << "of another series";

@@ -193,6 +193,9 @@ TEST_F(StoreTest, TellsOfEachPartWhatBecameOfIt)
     EXPECT_EQ(instances("1.2"), 2);
     EXPECT_EQ(filesBelowObjects(), 2);
     EXPECT_EQ(told(post(partOf("no DICOM") + "--cut--")), "409 :C000");
+    const std::string longest = "1." + std::string(62, '9');
+    EXPECT_EQ(told(store(anImage(longest.c_str()), "/studies/1.2")), "200 " + longest);
+    EXPECT_EQ(told(store(anImage((longest + '9').c_str()), "/studies/1.2")).substr(0, 4), "409 ");
     EXPECT_EQ(told(store(anImage("1.2.3.5"), "/studies/1.9")), "409 1.2.3.5:C001");
     EXPECT_EQ(told(store(anImage("1.2.3.5"), "/studies/1.2")), "200 1.2.3.5");
 }
@@ -304,6 +307,9 @@ TEST_F(StoreTest, AnswersWhatItCannotTakeBeforeItComes)
     EXPECT_EQ(post(part, "/studies", kType, "Accept: text/html\r\n").status, 406);
     EXPECT_EQ(post(part, "/studies/1.2/series").status, 405);
     EXPECT_EQ(post("nothing of it").status, 400);
+    const QByteArray boundary(201, 'b');
+    EXPECT_EQ(post("--" + boundary + "--", "/studies", "multipart/related; boundary=" + boundary).status,
+              400);
     EXPECT_EQ(told(post(part + part.left(part.size() - 20))), "202 1.2.3.1 :C000") << "the end is missing";
     EXPECT_EQ(told(post(part)), "400 :C000") << "nothing tells that it is whole";
     EXPECT_EQ(told(post(partOf(QByteArray(60000, 'x')) + "--cut--")), "409 :A700");

@@ -11,6 +11,7 @@
 #include "platform/base/LogFile.h"
 #include "platform/os/FileStatus.h"
 #include "platform/os/PathName.h"
+#include "platform/os/StagedFile.h"
 
 #include <unistd.h>
 
@@ -29,6 +30,14 @@ QString folderOf(const QByteArray& studyUID, const QString& volumes)
     const QString place = tagFile.mid(pathText(TagFile::metaFolder()).size());
     return pathText(absolutePath(pathBytes(volumes))) + QLatin1Char('/') +
            place.left(place.lastIndexOf(QLatin1Char('.')));
+}
+
+Result flushVolume(const QByteArray& path, const QByteArray& folder)
+{
+    SystemResult flushed = flushFile(path);
+    if (flushed.good())
+        flushed = flushFolder(folder);
+    return flushed.good() ? Result() : Result(flushed).within(QStringLiteral("cannot be flushed"));
 }
 
 }  // namespace
@@ -136,10 +145,14 @@ bool StudyStacker::clearSeries(const QByteArray& seriesUID, const TagMap& series
 
 Result StudyStacker::writeVolume(const QByteArray& seriesUID, const Stack& stack, int index)
 {
-    if (!makeFolder(mFolder))
+    const bool isFlushed = TagFile::durability() == TagFile::Durability::PowerLoss;
+    if (isFlushed ? makeLastingFolder(pathBytes(mFolder)).bad() : !makeFolder(mFolder))
         return Result::failure(QStringLiteral("Could not create folder %1").arg(mFolder));
     const QByteArray path = volumePath(seriesUID, index);
     Result written = writeStack(stack, filePathOf, path);
+    // The database will name the file, and its row is flushed always.
+    if (written.good() && isFlushed)
+        written = flushVolume(path, pathBytes(mFolder));
     FileStatus status;
     if (written.good() && !statusOf(path.constData(), status))
         return Result::failure(QStringLiteral("Volume file %1 is gone again").arg(pathText(path)));

@@ -2,6 +2,7 @@
 
 #include "kddlib/tagfile/TagFileSettings.h"
 #include "platform/os/PathName.h"
+#include "platform/os/StagedFile.h"
 #include "platform/resources/ExResource.h"
 
 #include <QFileInfo>
@@ -44,6 +45,13 @@ Flush flushing()
                                                                                    : Flush::Process;
 }
 
+/// A write flushes the file's name and its bytes, which are of no use where the folder's own name is lost.
+bool makeFolderFor(const QString& path)
+{
+    const QString folder = QFileInfo(path).path();
+    return flushing() == Flush::Disk ? makeLastingFolder(pathBytes(folder)).good() : makeFolder(folder);
+}
+
 }  // namespace
 
 LockedOpenResult StudyFile::open(const QString& path, Access access)
@@ -57,7 +65,7 @@ LockedOpenResult StudyFile::open(const QString& path, Access access)
     LockedOpenResult opened = attempt();
     if (opened || opened.failure == OpenFailure::Locked || !makesFile(access))
         return opened;
-    if (!makeFolder(QFileInfo(path).path())) {
+    if (!makeFolderFor(path)) {
         opened.failure = OpenFailure::NotFound;
         return opened;
     }

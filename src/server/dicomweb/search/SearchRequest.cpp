@@ -21,7 +21,7 @@ constexpr int kMaxConditions = 64;
 constexpr int kMaxValues = 2000;      // of one list; viewers ask for the prior studies of a patient so
 constexpr int kMaxValueSize = 65536;  // [bytes] of one parameter
 constexpr int kMaxFields = 1000;
-constexpr int kMaxPath = 8;  // sequences inside each other
+constexpr int kMaxPath = 8;  // attributes on the way to one, itself included
 constexpr int kMaxOrders = 4;
 
 // A page of the list has some hundred studies; of the images of one series a viewer wants all. The whole answer is in

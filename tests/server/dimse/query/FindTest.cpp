@@ -1,4 +1,5 @@
 #include "QueriedArchive.h"
+#include "server/dimse/QueryIdentifier.h"
 #include "support/RealFiles.h"
 
 #include <gmock/gmock.h>
@@ -161,6 +162,30 @@ TEST_P(FindTest, RefusesWhatItCannotUnderstand)
     for (const char* keys : kMisunderstood) {
         EXPECT_THAT(find(keysOf(keys)), HasSubstr("DataSetDoesNotMatchSOPClass")) << keys;
         EXPECT_TRUE(answers().empty()) << keys;
+    }
+}
+
+TEST(QueryIdentifier, AsksForNoMoreThanItMay)
+{
+    const auto reasonOf = [](const DatasetBuilder& keys) {
+        DcmDataset dataset(keys.build());
+        Dimse::QueryIdentifier identifier;
+        QString reason;
+        Dimse::QueryIdentifier::read(dataset, Dimse::QueryRoot::Study, identifier, reason);
+        return reason.toStdString();
+    };
+    DatasetBuilder many = anItem().with(DCM_QueryRetrieveLevel, "STUDY");
+    for (unsigned short i = 0; i < 1000; ++i)
+        many.with(DcmTag(0x0018, static_cast<unsigned short>(0x9000 + i), EVR_LO), "");
+    EXPECT_EQ(reasonOf(many), "");
+    EXPECT_EQ(reasonOf(many.with(DCM_PatientID, "")), "Too many attributes are asked for");
+    DatasetBuilder inner = anItem().with(DCM_CodeValue, "");
+    for (int depth = 1; depth <= 8; ++depth) {
+        inner = anItem().withItem(DCM_ConceptNameCodeSequence, inner);
+        DatasetBuilder deep = inner;
+        EXPECT_EQ(reasonOf(deep.with(DCM_QueryRetrieveLevel, "STUDY")),
+                  depth <= 7 ? "" : "Sequences are nested too deep")
+            << depth;
     }
 }
 
