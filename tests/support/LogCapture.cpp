@@ -22,6 +22,7 @@ LogCapture::~LogCapture()
 
 int LogCapture::count(const std::string& text) const
 {
+    const std::lock_guard lock(mMutex);
     return static_cast<int>(std::count_if(mLines.begin(), mLines.end(), [&](const std::string& line) {
         return line.find(text) != std::string::npos;
     }));

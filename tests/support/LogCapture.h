@@ -7,7 +7,7 @@
 namespace Kdd
 {
 
-/// Takes every log line while it lives, instead of its being written. Any thread may write; once they are done, ask.
+/// Takes every log line while it lives, instead of its being written. Any thread may write; what writes has to end before it.
 class LogCapture
 {
 public:
@@ -22,7 +22,7 @@ public:
     int count(const std::string& text) const;
 
 private:
-    std::mutex mMutex;
+    mutable std::mutex mMutex;
     std::vector<std::string> mLines;
 };
 
