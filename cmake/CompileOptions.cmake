@@ -1,5 +1,6 @@
-# One interface target that every target of ours links: warnings, sanitizers.
+# One interface target that every target of ours links: warnings, sanitizers, coverage.
 set(KDD_SANITIZE "" CACHE STRING "Sanitizers to build with, for example address,undefined")
+option(KDD_COVERAGE "Count how often each line and branch runs; asks for GCC" OFF)
 
 add_library(kdd_options INTERFACE)
 target_compile_options(kdd_options INTERFACE
@@ -16,6 +17,12 @@ if(KDD_SANITIZE)
     target_link_options(kdd_options INTERFACE
       $<$<IN_LIST:$<TARGET_PROPERTY:TYPE>,SHARED_LIBRARY$<SEMICOLON>MODULE_LIBRARY>:-Wl,-z,undefs>)
   endif()
+endif()
+if(KDD_COVERAGE)
+  # Tests too: of an inline function that both have, a test's program would else keep the one that does not count. Several
+  # threads count at once.
+  target_compile_options(kdd_options INTERFACE --coverage -fprofile-abs-path -fprofile-update=atomic)
+  target_link_options(kdd_options INTERFACE --coverage)
 endif()
 if(KDD_FUZZ)
   # The fuzzer sees where its inputs lead; tests of the same build are not hindered by it.

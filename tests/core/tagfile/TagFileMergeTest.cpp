@@ -47,7 +47,8 @@ TEST_F(TagFileMerge, WhatCannotBeMergedIsLeftAlone)
     TagFile::setMetaFolder("/proc/kdd");
     expectRefusal("Could not create meta folder " + QFileInfo(path()).path().toStdString());
     const LogCapture log;
-    EXPECT_FALSE(TagFile().mergeIntoCacheFile());
+    TagFile empty;
+    EXPECT_FALSE(empty.mergeIntoCacheFile() || empty.wasLockedOut());
     EXPECT_EQ(log.lines(), std::vector<std::string>{"No images, cannot update tag file"});
 }
 
@@ -100,6 +101,49 @@ TEST_F(TagFileMerge, ImagesHoldNothingThatTheirSeriesSaysOfItself)
         EXPECT_NE(fresh.findImage("f0")->findElement(kHasVolumeFile), nullptr) << "it inherits the mark";
         EXPECT_EQ(fresh.findImage("s")->findElement(kHasVolumeFile), nullptr);
         EXPECT_TRUE(fresh.study()->tagsForLevel().contains(kFromDatabase));
+    }
+}
+
+TEST_F(TagFileMerge, WhatMostImagesShowStandsOnceWhenTheyHaveBecomeTheMost)
+{
+    const auto addImages = [](TagFile& file, const char* prefix, int count, const char* part) {
+        for (int i = 0; i < count; ++i)
+            add(file, anImage((prefix + QByteArray::number(i)).constData()).with(DCM_BodyPartExamined, part));
+    };
+    TagFile stored;
+    TagFile fresh;
+    addImages(stored, "a", 3, "CHEST");
+    addImages(stored, "b", 2, "PELVIS");
+    addImages(fresh, "c", 2, "PELVIS");
+    stored.findSeries("1.2.3")->optimizeAll();
+    ASSERT_TRUE(stored.writeCacheFile() && fresh.mergeIntoCacheFile());
+    for (const TagMap* image : fresh.imagesByUID()) {
+        const bool isOfTheFew = image->uid(TagMap::ImageLevel).startsWith('a');
+        EXPECT_EQ(image->tagsForLevel().contains(DCM_BodyPartExamined), isOfTheFew);
+        EXPECT_EQ(image->findElement(DCM_BodyPartExamined)->value(), isOfTheFew ? "CHEST" : "PELVIS");
+    }
+}
+
+/// Only who built the file knows it; the images that come tell nothing of it.
+TEST_F(TagFileMerge, ASeriesKeepsItsMarkOfAVolumeFileAndGivesItToNoOther)
+{
+    for (const int numFresh : {1, 9}) {
+        TagFile stored;
+        TagFile fresh;
+        for (const char* seriesUID : {"1.2.3", "1.2.9"}) {
+            for (int i = 0; i < 4; ++i)
+                add(stored, anImage((seriesUID + QByteArray::number(i)).constData()).inSeries(seriesUID));
+            stored.findSeries(seriesUID)->putAndInsertInt(kHasVolumeFile, 1);
+        }
+        stored.study()->optimizeAll();
+        ASSERT_TRUE(stored.study()->tagsForLevel().contains(kHasVolumeFile)) << "all its series have one";
+        for (int i = 0; i < numFresh; ++i)
+            add(fresh, anImage(("f" + QByteArray::number(i)).constData()));
+        add(fresh, anImage("n").inSeries("1.2.8"));
+        ASSERT_TRUE(stored.writeCacheFile() && fresh.mergeIntoCacheFile());
+        for (const char* seriesUID : {"1.2.3", "1.2.9"})
+            EXPECT_NE(fresh.findSeries(seriesUID)->findElement(kHasVolumeFile), nullptr) << numFresh;
+        EXPECT_EQ(fresh.findSeries("1.2.8")->findElement(kHasVolumeFile), nullptr) << numFresh;
     }
 }
 

@@ -160,6 +160,30 @@ TEST_F(HandMade, ACopyOfASequenceOwnsOnlyWhatIsAddedToIt)
     EXPECT_EQ(map.setSequence(&none, 1024), held) << "one that is set again stays the same element";
 }
 
+TEST_F(HandMade, AssignmentTakesThePlaceOfWhatWasThere)
+{
+    series->putAndInsertString(DCM_PatientID, "7");
+    TagMap copy;
+    copy.putAndInsertString(DCM_PatientID, "8");
+    copy.putAndInsertString(DCM_Modality, "CT");
+    copy = *series;
+    EXPECT_EQ(ownText(copy), ownText(*series));
+}
+
+TEST_F(HandMade, ACopyThatIsAssignedBackChangesNothingWhereThereAreOnlyChildren)
+{
+    TagMap node;
+    auto* child = new TagMap;
+    node.addChildMap(child, TagMap::SeriesLevel);
+    ASSERT_TRUE(node.tagsForLevel().isEmpty());
+    {
+        const TagMap copy(node);
+        node = copy;
+    }
+    EXPECT_EQ(child->parent(), &node);
+    EXPECT_EQ(node.children(), QList<TagMap*>{child});
+}
+
 TEST_F(HandMade, ANodeThatIsAttachedAgainHangsOnceWithAllItShows)
 {
     TagMap* image = attach(anImage("1").with(DCM_PatientID, "7"));

@@ -130,6 +130,36 @@ TEST_F(Download, FailsWithALaterRangeWithoutAByteThatIsNotTheObjects)
     }
 }
 
+struct FirstAnswer
+{
+    const char* name;
+    void (*change)(ObjectServer::Answer&);
+    const char* reasonMidway;
+};
+
+const FirstAnswer kWithoutRanges[] = {
+    {"UnknownTotal", [](auto& a) { a.total = "*"; }, "does not say how long"},
+    {"NothingInRange", [](auto& a) { a.code = 416; }, ""},
+};
+
+TEST_F(Download, AsksForTheWholeWhereNoRangesCanBePlannedUnlessItBeganMidway)
+{
+    const QByteArray object = someObject(20'000);
+    for (const FirstAnswer& answer : kWithoutRanges) {
+        SCOPED_TRACE(answer.name);
+        const ObjectServer server(object, answer.change);
+        fetchInRanges(3, 2000);
+        KxCurlDownloadStream whole = client.read(server.url(), true);
+        EXPECT_EQ(readAll(whole), object);
+        EXPECT_TRUE(whole.httpStatus().ok());
+        EXPECT_EQ(server.requests().size(), 2U);
+        KxCurlDownloadStream rest = client.readFrom(server.url(), 5000);
+        readAll(rest);
+        EXPECT_FALSE(rest.httpStatus().ok());
+        EXPECT_THAT(rest.failure(), HasSubstr(answer.reasonMidway));
+    }
+}
+
 TEST_F(Download, NeverGivesAWrongByteWhateverFaultsComeTogether)
 {
     const QByteArray object = someObject(50'000);
