@@ -1,0 +1,95 @@
+#include "platform/decoder/program/Work.h"
+
+#include "platform/decoder/program/Confinement.h"
+#include "platform/late/LateLibrary.h"
+#include "platform/volume/ApartFrame.h"
+#include "platform/volume/CompressedFrame.h"
+#include "platform/volume/FrameEncoding.h"
+#include "platform/volume/FrameLayout.h"
+
+#include <unistd.h>
+
+#include <exception>
+#include <limits>
+
+namespace Kdd
+{
+namespace
+{
+
+// Longer than whoever gives the jobs waits for one: this counts where that one has ended.
+constexpr unsigned kMostSeconds = 300;
+
+/// A frame that was compressed here is decoded again.
+Result tryCoding(FrameCoding coding)
+{
+    FrameLayout layout;
+    layout.rows = layout.columns = 8;
+    layout.photometric = "MONOCHROME2";
+    const QByteArray pixels(64, 'x');
+    QByteArray bytes;
+    StoredFrame frame;
+    Result result = encodeFrame(coding, pixels, layout, bytes);
+    if (result.good())
+        result = decodeCodestream(bytes, layout, 0, frame);
+    if (result.good() && frame.pixels.pixels != pixels)
+        result = Result::failure(QStringLiteral("a frame does not come out as it went in"));
+    return result;
+}
+
+Result prepareFrames()
+{
+    Result result = loadLate(LateLibrary::Codecs);
+    for (const FrameCoding coding : {FrameCoding::JpegLossless, FrameCoding::JpegLs}) {
+        if (result.good())
+            result = tryCoding(coding);
+    }
+    if (result.bad())
+        return result;
+    // Of JPEG 2000 there is no encoder here; that this is refused takes its library too.
+    StoredFrame frame;
+    (void)decodeCodestream(QByteArray("\xff\x4f\xff\x51\0\0", 6), FrameLayout(), 0, frame);
+    return {};
+}
+
+DecoderMessage answerTo(const DecoderMessage& question)
+{
+    DecoderMessage failure;
+    try {
+        switch (question.word) {
+        case DecoderWord::Frame:
+            limitMemory(memoryForFrame(question));
+            return answerFrame(question);
+        default:
+            failure.head = "The decoder does not know what to do";
+            return failure;
+        }
+    } catch (const std::exception& fault) {
+        failure.head = QByteArray("It cannot be decoded: ") + fault.what();
+        return failure;
+    }
+}
+
+}  // namespace
+
+Result prepareFor(DecoderKind kind)
+{
+    return kind == DecoderKind::Frames ? prepareFrames()
+                                       : Result::failure(QStringLiteral("it has no decoder"));
+}
+
+void work(DecoderChannel& channel)
+{
+    DecoderMessage question;
+    while (channel.receive(std::numeric_limits<int>::max(), question) == DecoderChannel::Outcome::Done) {
+        ::alarm(kMostSeconds);
+        const DecoderMessage answer = answerTo(question);
+        ::alarm(0);
+        if (channel.send(answer) != DecoderChannel::Outcome::Done)
+            return;
+        // The room of large frames is not kept for small ones.
+        question = {};
+    }
+}
+
+}  // namespace Kdd
