@@ -107,4 +107,21 @@ DecoderChannel::Outcome DecoderChannel::read(void* bytes, qint64 size) const
     return Outcome::Done;
 }
 
+qint64 askForBytes(const DecoderChannel& channel, qint64 offset, char* out, qint64 length)
+{
+    using Outcome = DecoderChannel::Outcome;
+    DecoderMessage wanted;
+    wanted.word = DecoderWord::Wanted;
+    wanted.head = bytesOf(WantedBytes{offset, std::min(length, kMaxWanted)});
+    DecoderMessage bytes;
+    const bool isTold = channel.send(wanted) == Outcome::Done &&
+                        channel.receive(kMaxWanted, bytes) == Outcome::Done &&
+                        bytes.word == DecoderWord::Bytes && bytes.data.size() <= length;
+    // Who does not answer any more is not there any more; the end of the job shows that too.
+    if (!isTold)
+        return 0;
+    std::memcpy(out, bytes.data.constData(), static_cast<std::size_t>(bytes.data.size()));
+    return bytes.data.size();
+}
+
 }  // namespace Kdd

@@ -106,4 +106,8 @@ private:
     std::optional<Clock::time_point> mDeadline;
 };
 
+/// What a decoder reads its source by: up to `length` bytes from `offset` into `out`, no more than kMaxWanted; how many, 0
+/// where there are none.
+qint64 askForBytes(const DecoderChannel& channel, qint64 offset, char* out, qint64 length);
+
 }  // namespace Kdd

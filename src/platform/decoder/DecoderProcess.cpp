@@ -234,6 +234,7 @@ DecoderProcess::End DecoderProcess::run(const DecoderJob& job, const DecoderLimi
 Outcome DecoderProcess::converse(const DecoderJob& job, DecoderMessage& answer)
 {
     Outcome outcome = mChannel.send(job.question);
+    qint64 left = job.mostRead;
     while (outcome == Outcome::Done) {
         outcome = mChannel.receive(job.mostData, answer);
         if (outcome != Outcome::Done || answer.word == DecoderWord::Done ||
@@ -241,16 +242,16 @@ Outcome DecoderProcess::converse(const DecoderJob& job, DecoderMessage& answer)
             return outcome;
         if (answer.word != DecoderWord::Wanted || !answer.data.isEmpty())
             return Outcome::Nonsense;
-        outcome = give(job, answer.head);
+        outcome = give(job, answer.head, left);
     }
     return outcome;
 }
 
-Outcome DecoderProcess::give(const DecoderJob& job, const QByteArray& wanted)
+Outcome DecoderProcess::give(const DecoderJob& job, const QByteArray& wanted, qint64& left)
 {
     WantedBytes range;
     if (!job.source || !readFrom(wanted, range) || range.offset < 0 || range.length < 0 ||
-        range.length > kMaxWanted)
+        range.length > kMaxWanted || left <= 0)
         return Outcome::Nonsense;
     DecoderMessage bytes;
     bytes.word = DecoderWord::Bytes;
@@ -260,6 +261,7 @@ Outcome DecoderProcess::give(const DecoderJob& job, const QByteArray& wanted)
     // A slow disk or network is no fault of the decoder's.
     mChannel.setDeadline(*mChannel.deadline() + (DecoderChannel::Clock::now() - began));
     bytes.data.truncate(static_cast<int>(std::clamp<qint64>(count, 0, range.length)));
+    left -= bytes.data.size();
     return mChannel.send(bytes);
 }
 

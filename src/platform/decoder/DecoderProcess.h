@@ -39,6 +39,7 @@ struct DecoderJob
     /// Where the decoder may read, if anywhere: up to `length` bytes from `offset` into `out`; how many, 0 at the end, -1
     /// on failure. Called on the thread of the job.
     std::function<qint64(qint64 offset, char* out, qint64 length)> source;
+    qint64 mostRead = 0;  ///< there, in all [bytes]
 };
 
 /// A decoder that runs: a child of this process, which can do nothing but decode. What it says is not believed. One thread
@@ -76,7 +77,7 @@ private:
     Result spawn(const QByteArray& program, int theirs);
     Result awaitReady(const DecoderLimits& limits);
     DecoderChannel::Outcome converse(const DecoderJob& job, DecoderMessage& answer);
-    DecoderChannel::Outcome give(const DecoderJob& job, const QByteArray& wanted);
+    DecoderChannel::Outcome give(const DecoderJob& job, const QByteArray& wanted, qint64& left);
     QString end();
 
     DecoderKind mKind;

@@ -3,6 +3,7 @@
 #include "platform/decoder/program/Confinement.h"
 #include "platform/late/LateLibrary.h"
 #include "platform/volume/ApartFrame.h"
+#include "platform/volume/ApartVideo.h"
 #include "platform/volume/CompressedFrame.h"
 #include "platform/volume/FrameEncoding.h"
 #include "platform/volume/FrameLayout.h"
@@ -19,6 +20,9 @@ namespace
 
 // Longer than whoever gives the jobs waits for one: this counts where that one has ended.
 constexpr unsigned kMostSeconds = 300;
+
+// The largest pictures that are decoded, and as many of them as a stream may refer to.
+constexpr qint64 kVideoMemory = qint64(3) << 30;
 
 /// A frame that was compressed here is decoded again.
 Result tryCoding(FrameCoding coding)
@@ -52,7 +56,7 @@ Result prepareFrames()
     return {};
 }
 
-DecoderMessage answerTo(const DecoderMessage& question)
+DecoderMessage answerTo(const DecoderChannel& channel, const DecoderMessage& question)
 {
     DecoderMessage failure;
     try {
@@ -60,6 +64,9 @@ DecoderMessage answerTo(const DecoderMessage& question)
         case DecoderWord::Frame:
             limitMemory(memoryForFrame(question));
             return answerFrame(question);
+        case DecoderWord::Video:
+            limitMemory(kVideoMemory);
+            return answerVideo(channel, question);
         default:
             failure.head = "The decoder does not know what to do";
             return failure;
@@ -74,8 +81,15 @@ DecoderMessage answerTo(const DecoderMessage& question)
 
 Result prepareFor(DecoderKind kind)
 {
-    return kind == DecoderKind::Frames ? prepareFrames()
-                                       : Result::failure(QStringLiteral("it has no decoder"));
+    switch (kind) {
+    case DecoderKind::Frames:
+        return prepareFrames();
+    case DecoderKind::Videos:
+        return loadVideoModule();
+    case DecoderKind::VolumeFiles:
+        break;
+    }
+    return Result::failure(QStringLiteral("it does not read volume files"));
 }
 
 void work(DecoderChannel& channel)
@@ -83,7 +97,7 @@ void work(DecoderChannel& channel)
     DecoderMessage question;
     while (channel.receive(std::numeric_limits<int>::max(), question) == DecoderChannel::Outcome::Done) {
         ::alarm(kMostSeconds);
-        const DecoderMessage answer = answerTo(question);
+        const DecoderMessage answer = answerTo(channel, question);
         ::alarm(0);
         if (channel.send(answer) != DecoderChannel::Outcome::Done)
             return;
