@@ -30,17 +30,6 @@ constexpr int kMaxReason = 500;
 constexpr const char* kKept[] = {"KDD_MODULE_FOLDER", "LD_LIBRARY_PATH", "ASAN_OPTIONS", "TSAN_OPTIONS",
                                  "UBSAN_OPTIONS"};
 
-/// A text of somebody who is not believed, for a line of the log.
-QString plainText(const QByteArray& text)
-{
-    QString plain = QString::fromUtf8(text.left(kMaxReason));
-    for (QChar& each : plain) {
-        if (!each.isPrint())
-            each = QLatin1Char('?');
-    }
-    return plain;
-}
-
 /// The attributes and actions of a start, which have to be freed.
 class Spawning
 {
@@ -103,6 +92,16 @@ private:
 };
 
 }  // namespace
+
+QString readableText(const QByteArray& text)
+{
+    QString readable = QString::fromUtf8(text.left(kMaxReason));
+    for (QChar& each : readable) {
+        if (!each.isPrint())
+            each = QLatin1Char('?');
+    }
+    return readable;
+}
 
 const char* nameOf(DecoderKind kind)
 {
@@ -170,7 +169,7 @@ Result DecoderProcess::awaitReady(const DecoderLimits& limits)
         protocol == kDecoderProtocol)
         return {};
     if (outcome == Outcome::Done && said.word == DecoderWord::Failed)
-        return Result::failure(plainText(said.head));
+        return Result::failure(readableText(said.head));
     if (outcome == Outcome::Ended)
         return Result::failure(QStringLiteral("it ended before it was ready (%1)").arg(end()));
     return Result::failure(outcome == Outcome::Late ? QStringLiteral("it was not ready in time")
@@ -216,7 +215,7 @@ DecoderProcess::End DecoderProcess::run(const DecoderJob& job, const DecoderLimi
     mRestsSince = DecoderChannel::Clock::now();
     mWorked += std::chrono::duration_cast<std::chrono::milliseconds>(mRestsSince - began);
     if (outcome == Outcome::Done) {
-        result = answer.word == DecoderWord::Failed ? Result::failure(plainText(answer.head)) : Result();
+        result = answer.word == DecoderWord::Failed ? Result::failure(readableText(answer.head)) : Result();
         return End::Answered;
     }
     const QString how = end();

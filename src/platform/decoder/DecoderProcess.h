@@ -20,6 +20,9 @@ enum class DecoderKind { Frames, Videos, VolumeFiles };
 /// The argument by which it is told.
 const char* nameOf(DecoderKind kind);
 
+/// What a decoder says, made fit for a line of the log.
+QString readableText(const QByteArray& text);
+
 /// What decoders may take.
 struct DecoderLimits
 {

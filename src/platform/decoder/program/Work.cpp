@@ -7,6 +7,7 @@
 #include "platform/volume/CompressedFrame.h"
 #include "platform/volume/FrameEncoding.h"
 #include "platform/volume/FrameLayout.h"
+#include "platform/volumefile/ApartVolume.h"
 
 #include <unistd.h>
 
@@ -23,6 +24,9 @@ constexpr unsigned kMostSeconds = 300;
 
 // The largest pictures that are decoded, and as many of them as a stream may refer to.
 constexpr qint64 kVideoMemory = qint64(3) << 30;
+
+// All parameters that a volume file may have, as the library and as we hold them.
+constexpr qint64 kVolumeMemory = qint64(1) << 30;
 
 /// A frame that was compressed here is decoded again.
 Result tryCoding(FrameCoding coding)
@@ -67,6 +71,9 @@ DecoderMessage answerTo(const DecoderChannel& channel, const DecoderMessage& que
         case DecoderWord::Video:
             limitMemory(kVideoMemory);
             return answerVideo(channel, question);
+        case DecoderWord::Volume:
+            limitMemory(kVolumeMemory);
+            return VolumeFile::answerVolume(channel, question);
         default:
             failure.head = "The decoder does not know what to do";
             return failure;
@@ -89,7 +96,7 @@ Result prepareFor(DecoderKind kind)
     case DecoderKind::VolumeFiles:
         break;
     }
-    return Result::failure(QStringLiteral("it does not read volume files"));
+    return VolumeFile::prepareVolumes();
 }
 
 void work(DecoderChannel& channel)
