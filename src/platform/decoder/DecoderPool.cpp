@@ -21,19 +21,6 @@ namespace
 
 constexpr char kProgram[] = "kdd-decoder";
 
-/// Where it lies, else where it should.
-QByteArray findProgram()
-{
-    const QStringList folders = moduleFolders();
-    QString path = folders.first() + QLatin1Char('/') + QLatin1String(kProgram);
-    for (const QString& folder : folders) {
-        const QString other = QDir(folder).absoluteFilePath(QLatin1String(kProgram));
-        if (!QFileInfo::exists(path) && QFileInfo::exists(other))
-            path = other;
-    }
-    return pathBytes(path);
-}
-
 }  // namespace
 
 DecoderPool::DecoderPool(QByteArray program, const DecoderLimits& limits)
@@ -44,10 +31,22 @@ DecoderPool::DecoderPool(QByteArray program, const DecoderLimits& limits)
 {
 }
 
+QByteArray DecoderPool::programOfProcess()
+{
+    const QStringList folders = moduleFolders();
+    QString found;
+    for (const QString& folder : folders) {
+        const QString path = QDir(folder).absoluteFilePath(QLatin1String(kProgram));
+        if (found.isEmpty() || (!QFileInfo::exists(found) && QFileInfo::exists(path)))
+            found = path;
+    }
+    return pathBytes(found);
+}
+
 /// Never destroyed, because when the process ends other threads may still decode; its decoders end with it.
 DecoderPool& DecoderPool::ofProcess()
 {
-    static auto* const pool = new DecoderPool(findProgram());
+    static auto* const pool = new DecoderPool(programOfProcess());
     return *pool;
 }
 
@@ -59,7 +58,9 @@ Result DecoderPool::run(DecoderKind kind, const DecoderJob& job, DecoderMessage&
         if (process == nullptr)
             return result;
         const auto end = process->run(job, mLimits, answer, result);
-        const bool isReusable = end == DecoderProcess::End::Answered && process->worked() < mLimits.life;
+        // What cannot be decoded may have left traces in it.
+        const bool isReusable =
+            end == DecoderProcess::End::Answered && result.good() && process->worked() < mLimits.life;
         if (!isReusable)
             process.reset();
         takeBack(std::move(process));

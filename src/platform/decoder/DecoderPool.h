@@ -14,7 +14,8 @@ namespace Kdd
 {
 
 /// The decoders of a process: started when there is a job and none is free, kept for the next one, ended when they have
-/// rested. Each does one job at a time; threads wait where all are at work. May be used on any thread.
+/// rested, have worked for long, or say that something cannot be decoded. Each does one job at a time; threads wait where
+/// all are at work. May be used on any thread.
 ///
 /// In a process that was copied by fork it begins anew, so that parent and child do not talk to the same decoders.
 class DecoderPool
@@ -23,7 +24,10 @@ public:
     /// With decoders of the file `program`.
     explicit DecoderPool(QByteArray program, const DecoderLimits& limits = {});
 
-    /// The one of this process. A decoder that is not installed is the failure of each job.
+    /// The file kdd-decoder among the modules of the library, or where it should be.
+    static QByteArray programOfProcess();
+
+    /// The one of this process, with that program. A decoder that is not installed is the failure of each job.
     static DecoderPool& ofProcess();
 
     /// Has a job done. One that dies of it is replaced, and the job is given once more: what it died of may have been an
