@@ -2,8 +2,6 @@
 
 #include "platform/os/SystemResult.h"
 
-#include <QList>
-
 #include <fcntl.h>
 #include <spawn.h>
 #include <sys/socket.h>
@@ -27,8 +25,8 @@ constexpr int kMaxReason = 500;
 
 // What a decoder is given of the environment: where libraries are, and how checkers of memory are set. Nothing else, for
 // there may be passwords in it.
-constexpr const char* kKept[] = {"KDD_MODULE_FOLDER", "LD_LIBRARY_PATH", "ASAN_OPTIONS", "TSAN_OPTIONS",
-                                 "UBSAN_OPTIONS"};
+constexpr const char* kKept[] = {
+    "KDD_MODULE_FOLDER=", "LD_LIBRARY_PATH=", "ASAN_OPTIONS=", "TSAN_OPTIONS=", "UBSAN_OPTIONS="};
 
 /// The attributes and actions of a start, which have to be freed.
 class Spawning
@@ -70,20 +68,19 @@ public:
 
     int start(const QByteArray& program, const char* kind, pid_t& pid) const
     {
-        QList<QByteArray> texts;
-        for (const char* name : kKept) {
-            if (qEnvironmentVariableIsSet(name))
-                texts.append(QByteArray(name) + '=' + qgetenv(name));
+        std::vector<char*> kept;
+        for (char** each = environ; each != nullptr && *each != nullptr; ++each) {
+            for (const char* beginning : kKept) {
+                if (std::strncmp(*each, beginning, std::strlen(beginning)) == 0)
+                    kept.push_back(*each);
+            }
         }
-        std::vector<char*> environment;
-        for (QByteArray& text : texts)
-            environment.push_back(text.data());
-        environment.push_back(nullptr);
+        kept.push_back(nullptr);
         QByteArray name = program;
         QByteArray argument = kind;
         char* arguments[] = {name.data(), argument.data(), nullptr};
         return ::posix_spawn(&pid, program.constData(), &mActions, &mAttributes,
-                             static_cast<char**>(arguments), environment.data());
+                             static_cast<char**>(arguments), kept.data());
     }
 
 private:
