@@ -9,8 +9,6 @@
 #include "platform/volume/FrameLayout.h"
 #include "platform/volumefile/ApartVolume.h"
 
-#include <unistd.h>
-
 #include <exception>
 #include <limits>
 
@@ -20,7 +18,7 @@ namespace
 {
 
 // Longer than whoever gives the jobs waits for one: this counts where that one has ended.
-constexpr unsigned kMostSeconds = 300;
+constexpr long kMostSeconds = 300;
 
 // The largest pictures that are decoded, and as many of them as a stream may refer to.
 constexpr qint64 kVideoMemory = qint64(3) << 30;
@@ -103,9 +101,9 @@ void work(DecoderChannel& channel)
 {
     DecoderMessage question;
     while (channel.receive(std::numeric_limits<int>::max(), question) == DecoderChannel::Outcome::Done) {
-        ::alarm(kMostSeconds);
+        endAfter(kMostSeconds * 1000);
         const DecoderMessage answer = answerTo(channel, question);
-        ::alarm(0);
+        endAfter(0);
         if (channel.send(answer) != DecoderChannel::Outcome::Done)
             return;
         // The room of large frames is not kept for small ones.
