@@ -123,7 +123,8 @@ Result filterCalls()
     // Its own memory only, which does not go beyond the hard limit.
     filter.allowWith(SYS_prlimit64, 1, RLIMIT_AS);
     if (kIsCheckedBuild) {
-        // By these checkers find out whether an address may be read.
+        // By these checkers find out whether an address may be read, and where a signal's stack is when one is left.
+        filter.allow(SYS_sigaltstack);
         filter.allow(SYS_pipe2);
         filter.allow(SYS_write);
         filter.allow(SYS_close);
