@@ -3,7 +3,7 @@
 
     packaging/materials.py BUILD-FOLDER
 
-Every Debian package that has a library which the tool, the library or one of the modules loads, directly or not, or headers that
+Every Debian package that has a library which the tool, the library, the decoder or one of the modules loads, directly or not, or headers that
 are compiled in. Licences are the names that the packages' copyright files give; one that has no such list is told so.
 """
 import glob
@@ -23,7 +23,7 @@ def lines(*command):
 
 def built(folder):
     found = [os.path.join(folder, name) for name in ("src/tools/kdd/kdd", "src/core/kddlib/libkdd.so")]
-    found += glob.glob(os.path.join(folder, "kddlib/*.so"))
+    found += glob.glob(os.path.join(folder, "kddlib/*.so")) + [os.path.join(folder, "kddlib/kdd-decoder")]
     if not all(map(os.path.exists, found)) or len(found) < 3:
         sys.exit(f"{folder} holds no whole build of release")
     return found

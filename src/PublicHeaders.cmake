@@ -100,6 +100,7 @@ set(KDD_PUBLIC_HEADERS
   platform/database/StudyProofs.h
   platform/database/StudySearch.h
   platform/database/TagFileStamp.h
+  platform/decoder/DecoderPlace.h
   platform/filecache/ExFileCache.h
   platform/os/ExclusiveFile.h
   platform/os/FileStatus.h

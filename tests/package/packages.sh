@@ -61,12 +61,17 @@ headers=$root/usr/include/kddlib
 [ -z "$(find "$headers" -mindepth 1 -type d)" ] || fail "Installed headers lie in folders"
 ! grep -rn '#include "' "$headers" || fail "An installed header names a folder of the source"
 ! grep -rIl "$build" "$root/usr" || fail "These know where they were built"
-for file in "$root"/usr/bin/kdd "$root"/usr/lib/*/libkdd.so.0 "$root"/usr/lib/*/kddlib/*.so; do
+for file in "$root"/usr/bin/kdd "$root"/usr/lib/*/libkdd.so.0 "$root"/usr/lib/*/kddlib/*; do
     grep -q BIND_NOW <<<"$(readelf -dW "$file")" || fail "$file resolves names after its start"
     ! readelf -d "$file" | grep -E 'R(UN)?PATH' | grep -v '\[\$ORIGIN/' || fail "$file looks for libraries elsewhere"
 done
 
-for file in "$root"/usr/lib/*/libkdd.so.0 "$root"/usr/lib/*/kddlib/kdd-tool.so; do
+decoder=$(echo "$root"/usr/lib/*/kddlib/kdd-decoder)
+[ -x "$decoder" ] || fail "There is no decoder"
+# Nobody but the library starts it.
+"$decoder" frames </dev/null 2>/dev/null && fail "The decoder decodes for anybody"
+[ $? -eq 2 ] || fail "The decoder cannot be started"
+for file in "$root"/usr/lib/*/libkdd.so.0 "$decoder" "$root"/usr/lib/*/kddlib/kdd-tool.so; do
     grep -q __stack_chk_fail <<<"$(readelf --dyn-syms -W "$file")" || fail "$file does not watch its stack"
 done
 

@@ -1,4 +1,6 @@
 #include "CommandLineFixture.h"
+#include "support/RealFiles.h"
+#include "support/Setting.h"
 
 #include <QFileInfo>
 
@@ -73,6 +75,30 @@ TEST_F(BareTool, TakesImagesWithoutTheirPictures)
     EXPECT_EQ(answer.number("images"), 1);
     EXPECT_TRUE(answer.err.contains("kdd-pictures.so is not installed in")) << answer.err.toStdString();
     EXPECT_EQ(imagesOf("1.4"), 1);
+}
+
+TEST_F(BareTool, DecodesNothingWhereThereIsNoDecoder)
+{
+    if (realFilesFolder().isEmpty())
+        GTEST_SKIP() << "KDD_TEST_DATA names no folder of real files";
+    QDir().mkpath(path("bare/kddlib"));
+    // What would decode inside is there.
+    for (const char* module : {"/kddlib/kdd-database.so", "/kddlib/kdd-pictures.so", "/kddlib/kdd-codecs.so"})
+        ASSERT_TRUE(QFile::copy(QStringLiteral(KDD_BUILD_FOLDER) + QLatin1String(module),
+                                path("bare") + QLatin1String(module)));
+    const QString add = QStringLiteral("add --json ") + realFilesFolder() +
+                        QStringLiteral("/transfer-syntaxes/jpeg2000-lossless-90/");
+    {
+        const Setting setting("KDD_DECODER", "inside");
+        const Answer inside = run(qPrintable(add + QStringLiteral("emri_small_jpeg_2k_lossless.dcm")));
+        EXPECT_EQ(inside.number("images"), 1);
+        EXPECT_FALSE(inside.err.contains("preview")) << inside.err.toStdString();
+    }
+    const Answer apart = run(qPrintable(add + QStringLiteral("MR_small_jp2klossless.dcm")));
+    EXPECT_EQ(apart.number("images"), 1);
+    EXPECT_TRUE(apart.err.contains("MR_small_jp2klossless.dcm")) << apart.err.toStdString();
+    EXPECT_TRUE(apart.err.contains("bare/kddlib/kdd-decoder: it cannot be started"))
+        << apart.err.toStdString();
 }
 
 }  // namespace

@@ -31,6 +31,9 @@ QString ownFolder()
 QStringList moduleFolders()
 {
     const QString own = ownFolder();
+    // A program that belongs to the modules lies among them, which no library does.
+    if (QFileInfo::exists(own + QLatin1String("/kdd-decoder")))
+        return {own};
     QStringList folders = {own + QLatin1String("/kddlib")};
     // Only what was not installed looks where it was built: elsewhere anybody might have made a folder of that name.
     const QString build = QStringLiteral(KDD_BUILD_FOLDER "/");

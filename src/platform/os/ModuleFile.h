@@ -10,7 +10,7 @@ namespace Kdd
 {
 
 /// Where the library's modules lie: the folder `kddlib` beside the file of the library, or of the program that it is built
-/// into. Those of a library that was not installed lie in its build.
+/// into; for the decoder, which lies among them, its own. Those of a library that was not installed lie in its build.
 KDD_EXPORT QStringList moduleFolders();
 
 /// Loads `file`, a shared library that is no part of the start of a program, from the first of `folders` that has it.

@@ -39,6 +39,7 @@ constexpr Setting kAnswersFolder = {"KDD_ANSWERS", "folders/answers", ""};
 constexpr Setting kAnswersSize = {"KDD_ANSWERS_SIZE", "folders/answerssize", "1024"};
 constexpr Setting kTlsVerify = {"KDD_TLS_VERIFY", "tls/verify", "0"};
 constexpr Setting kTlsCaFile = {"KDD_TLS_CA_FILE", "tls/cafile", ""};
+constexpr Setting kDecoder = {"KDD_DECODER", "decoder/place", ""};
 constexpr Setting kSettleSeconds = {"KDD_SETTLE_SECONDS", "archive/settleseconds", "300"};
 constexpr Setting kReadPatience = {"KDD_READ_PATIENCE", "tagfiles/readpatience", "2000"};
 constexpr Setting kDatabasePatience = {"KDD_DATABASE_PATIENCE", "database/patience", "20"};
@@ -208,6 +209,11 @@ bool ExResource::verifiesTls()
 QByteArray ExResource::tlsCaFile()
 {
     return valueOf(kTlsCaFile);
+}
+
+QByteArray ExResource::decoder()
+{
+    return valueOf(kDecoder);
 }
 
 int ExResource::readPatience()

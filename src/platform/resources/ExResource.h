@@ -59,6 +59,10 @@ public:
     /// that the system trusts.
     static QByteArray tlsCaFile();
 
+    /// Where pictures, videos and volume files are decoded, "apart" or "inside". KDD_DECODER, decoder/place, empty: as the
+    /// program says, setDecoderPlace().
+    static QByteArray decoder();
+
     /// How long whoever serves others tries to read a tag file that others hold [ms], 0 to 600000; 400 are tried in any
     /// case. A merge into the largest studies takes a second or two. KDD_READ_PATIENCE, tagfiles/readpatience, "2000".
     static int readPatience();

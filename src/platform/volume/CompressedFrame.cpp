@@ -1,5 +1,8 @@
 #include "platform/volume/CompressedFrame.h"
 
+#include "platform/decoder/DecoderPlace.h"
+#include "platform/decoder/DecoderPool.h"
+#include "platform/volume/ApartFrame.h"
 #include "platform/volume/FragmentReader.h"
 #include "platform/volume/FrameLayout.h"
 #include "platform/volume/NativeFrame.h"
@@ -70,14 +73,21 @@ Result decodeDeflated(const QByteArray& bytes, const FrameLayout& layout, Stored
     return Result();
 }
 
+Result decodeCodestream(const QByteArray& bytes, const FrameLayout& layout, int least, StoredFrame& out)
+{
+    return recognizeCodestream(bytes) == Codestream::Jpeg2000 ? decodeJpeg2000(bytes, layout, least, out)
+                                                              : decodeJpeg(bytes, layout, out);
+}
+
 Result decodeFrame(const QByteArray& bytes, E_TransferSyntax xfer, const FrameLayout& layout, int least,
                    StoredFrame& out)
 {
     switch (recognizeCodestream(bytes)) {
     case Codestream::Jpeg:
-        return decodeJpeg(bytes, layout, out);
     case Codestream::Jpeg2000:
-        return decodeJpeg2000(bytes, layout, least, out);
+        return decoderPlace() == DecoderPlace::Inside
+                   ? decodeCodestream(bytes, layout, least, out)
+                   : decodeFrameApart(DecoderPool::ofProcess(), bytes, layout, least, out);
     case Codestream::JpegXl:
         return noDecoder("JPEG XL");
     case Codestream::Unknown:

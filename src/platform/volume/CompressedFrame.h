@@ -16,8 +16,13 @@ struct FrameLayout;
 
 /// Decodes the compressed bytes of a frame. `xfer` is consulted only where they do not show themselves what they are;
 /// it is EXS_Unknown, or one without compression, when the library that read the dataset does not know the syntax.
+///
+/// JPEG in all its forms, which libraries of others decode, is decoded apart where decoderPlace() says so.
 Result decodeFrame(const QByteArray& bytes, E_TransferSyntax xfer, const FrameLayout& layout, int least,
                    StoredFrame& out);
+
+/// Decodes JPEG, JPEG-LS or JPEG 2000, which these bytes have to be, in this process.
+Result decodeCodestream(const QByteArray& bytes, const FrameLayout& layout, int least, StoredFrame& out);
 
 /// MPEG-2, H.264 or HEVC: a stream whose frames cannot be told apart without decoding it.
 bool isVideo(E_TransferSyntax xfer);

@@ -1,9 +1,12 @@
 #include "platform/volume/KxCompressedDataMedia.h"
 
 #include "platform/base/LogFile.h"
+#include "platform/decoder/DecoderPlace.h"
+#include "platform/decoder/DecoderPool.h"
 #include "platform/os/ModuleFile.h"
 #include "platform/os/PathName.h"
 #include "platform/os/RandomAccessFile.h"
+#include "platform/volume/ApartVideo.h"
 #include "platform/volume/ffmpeg/VideoModule.h"
 
 #include <QFile>
@@ -80,6 +83,13 @@ VideoModule findModule()
     return module;
 }
 
+/// Looked for once: what is missing then is missing for the life of the process.
+const VideoModule& videoModule()
+{
+    static const VideoModule sModule = findModule();
+    return sModule;
+}
+
 // Nothing may be thrown through the decoders: they are C.
 std::int64_t readSource(void* source, std::int64_t offset, void* out, std::int64_t length) noexcept
 {
@@ -110,27 +120,27 @@ unsigned char* allocateFrame(void* target, std::int32_t width, std::int32_t heig
 
 }  // namespace
 
-Result KxCompressedDataMedia::decodeRepresentativeFrame(MediaSource& source, int width, int height,
-                                                        double fraction, TypedData2D& frame)
+Result loadVideoModule()
 {
-    // Looked for once: what is missing then is missing for the life of the process.
-    static const VideoModule module = findModule();
-    if (module.entry == nullptr)
-        return Result::failure(module.reason);
-    if (width <= 0 || height <= 0 || std::isnan(fraction))
-        return Result::failure(QStringLiteral("No frame has the size %1 x %2").arg(width).arg(height));
+    return videoModule().entry == nullptr ? Result::failure(videoModule().reason) : Result();
+}
 
+Result decodeVideoInside(MediaSource& source, const VideoPlace& place, TypedData2D& frame)
+{
+    Result loaded = loadVideoModule();
+    if (loaded.bad())
+        return loaded;
     TypedData2D decoded;
     VideoRequest request;
-    request.width = width;
-    request.height = height;
-    request.fraction = std::clamp(fraction, 0.0, 1.0);
+    request.width = place.width;
+    request.height = place.height;
+    request.fraction = place.fraction;
     request.source = &source;
     request.size = source.size();
     request.read = &readSource;
     request.target = &decoded;
     request.allocate = &allocateFrame;
-    if (module.entry(&request) != 1) {
+    if (videoModule().entry(&request) != 1) {
         // A module of another version does not touch the request.
         const QString reason = QString::fromUtf8(static_cast<const char*>(request.reason));
         return Result::failure(
@@ -139,6 +149,17 @@ Result KxCompressedDataMedia::decodeRepresentativeFrame(MediaSource& source, int
     }
     frame = decoded;
     return {};
+}
+
+Result KxCompressedDataMedia::decodeRepresentativeFrame(MediaSource& source, int width, int height,
+                                                        double fraction, TypedData2D& frame)
+{
+    if (width <= 0 || height <= 0 || std::isnan(fraction))
+        return Result::failure(QStringLiteral("No frame has the size %1 x %2").arg(width).arg(height));
+    const VideoPlace place = {width, height, std::clamp(fraction, 0.0, 1.0)};
+    return decoderPlace() == DecoderPlace::Inside
+               ? decodeVideoInside(source, place, frame)
+               : decodeVideoApart(DecoderPool::ofProcess(), source, place, frame);
 }
 
 TypedData2D KxCompressedDataMedia::decodeRepresentativeFrame(const QString& path, qint64 offset, qint64 size,

@@ -86,4 +86,32 @@ QByteArray inflated(const QByteArray& stream, int size)
     return result == LIBDEFLATE_SUCCESS ? content : QByteArray();
 }
 
+Result checkStored(qint64 stored, qint64 fileSize, const ChunkForm& form)
+{
+    // What compression may add to a chunk that cannot be compressed.
+    constexpr qint64 kMaxOverhead = 1024;
+    if (stored == 0)
+        return Result::failure(QStringLiteral("is not in the file"));
+    // A length that cannot be is refused before memory is taken for it.
+    const qint64 most = qint64(form.chunkBytes) + form.chunkBytes / 16 + kMaxOverhead;
+    if (stored < 0 || stored > fileSize || stored > most || !canInflate(stored, form.chunkBytes))
+        return Result::failure(QStringLiteral("claims %1 bytes for %2").arg(stored).arg(form.chunkBytes));
+    return {};
+}
+
+/// In the reverse order of writing: first the compression, then the shuffling.
+Result decodeChunk(const QByteArray& stored, unsigned skippedFilters, const ChunkForm& form,
+                   QByteArray& bytes)
+{
+    // Other writers store a chunk as it is when a filter gains nothing, and mark the filter by its place.
+    const unsigned deflate = form.isShuffled ? 2 : 1;
+    const bool isShuffled = form.isShuffled && (skippedFilters & 1U) == 0;
+    const QByteArray content = (skippedFilters & deflate) != 0 ? stored : inflated(stored, form.chunkBytes);
+    // What was stored uncompressed has not been held against its exact size yet.
+    if (content.size() != form.chunkBytes)
+        return Result::failure(QStringLiteral("is damaged"));
+    bytes = isShuffled ? unshuffled(content, form.elementSize) : content;
+    return {};
+}
+
 }  // namespace Kdd::VolumeFile

@@ -5,6 +5,7 @@
 #include "platform/volumefile/hdf5/OwnTypes.h"
 
 #include <array>
+#include <limits>
 
 namespace Kdd::VolumeFile
 {
@@ -14,8 +15,6 @@ namespace
 static_assert(Q_BYTE_ORDER == Q_LITTLE_ENDIAN, "chunks hold numbers in the byte order of this machine");
 
 constexpr unsigned kDeflateLevel = 1;
-// What compression may add to a chunk that cannot be compressed.
-constexpr qint64 kMaxOverhead = 1024;
 
 }  // namespace
 
@@ -59,7 +58,7 @@ Result ChunkedData::readType()
     const std::size_t size = H5Tget_size(mType.id());
     if ((kind != H5T_INTEGER && kind != H5T_FLOAT && !isFixedText) || size < 1 || size > sizeof(double))
         return Result::failure(QStringLiteral("has elements that are neither numbers nor characters"));
-    mElementSize = static_cast<int>(size);
+    mForm.elementSize = static_cast<int>(size);
     return {};
 }
 
@@ -85,14 +84,15 @@ Result ChunkedData::readLayout()
 bool ChunkedData::setChunkBytes()
 {
     // elementCount is 0 for what is too large, so the check below catches both.
-    mChunkBytes = static_cast<int>(elementCount(mChunk, kMaxChunkBytes / mElementSize)) * mElementSize;
-    return mChunkBytes > 0;
+    mForm.chunkBytes =
+        static_cast<int>(elementCount(mChunk, kMaxChunkBytes / mForm.elementSize)) * mForm.elementSize;
+    return mForm.chunkBytes > 0;
 }
 
 Result ChunkedData::readFilters(hid_t properties)
 {
     const int count = H5Pget_nfilters(properties);
-    mIsShuffled = count == 2;
+    mForm.isShuffled = count == 2;
     for (int i = 0; i < count; ++i) {
         unsigned flags = 0;
         unsigned parameter = 0;
@@ -101,8 +101,8 @@ Result ChunkedData::readFilters(hid_t properties)
         const H5Z_filter_t filter = H5Pget_filter2(properties, static_cast<unsigned>(i), &flags,
                                                    &numParameters, &parameter, 0, nullptr, nullptr);
         // The shuffle must run with our own element size, for decode() undoes it with that one.
-        const bool isShuffle = mIsShuffled && i == 0 && filter == H5Z_FILTER_SHUFFLE && numParameters == 1 &&
-                               parameter == static_cast<unsigned>(mElementSize);
+        const bool isShuffle = mForm.isShuffled && i == 0 && filter == H5Z_FILTER_SHUFFLE &&
+                               numParameters == 1 && parameter == static_cast<unsigned>(mForm.elementSize);
         const bool isDeflate = i == count - 1 && filter == H5Z_FILTER_DEFLATE;
         if (!isShuffle && !isDeflate)
             return Result::failure(QStringLiteral("has filter %1 at place %2").arg(filter).arg(i));
@@ -129,15 +129,15 @@ Result ChunkedData::create(hid_t group, const QByteArray& name, hid_t type, cons
     mDims = dims;
     mChunk = chunk;
     mType = Handle(H5Tcopy(type), H5Tclose);
-    mElementSize = static_cast<int>(H5Tget_size(type));
+    mForm.elementSize = static_cast<int>(H5Tget_size(type));
     // Bytes that are elements already have no planes to be sorted into.
-    mIsShuffled = mElementSize > 1;
+    mForm.isShuffled = mForm.elementSize > 1;
     if (!setChunkBytes())
         return Result::failure(QStringLiteral("has chunks of more than %1 bytes").arg(kMaxChunkBytes));
     const Handle space(H5Screate_simple(dims.size(), dims.constData(), nullptr), H5Sclose);
     const Handle properties(H5Pcreate(ownType(OwnType::DatasetCreation)), H5Pclose);
     H5Pset_chunk(properties.id(), chunk.size(), chunk.constData());
-    if (mIsShuffled)
+    if (mForm.isShuffled)
         H5Pset_shuffle(properties.id());
     H5Pset_deflate(properties.id(), kDeflateLevel);
     mDataset = Handle(
@@ -151,7 +151,12 @@ Result ChunkedData::readChunk(const QVector<hsize_t>& start, QByteArray& bytes) 
     hsize_t size = 0;
     if (H5Dget_chunk_storage_size(mDataset.id(), start.constData(), &size) < 0)
         return libraryFailure(QStringLiteral("cannot be found"));
-    Result plausible = checkStored(size);
+    const Handle file(H5Iget_file_id(mDataset.id()), H5Fclose);
+    hsize_t fileSize = 0;
+    if (size != 0 && H5Fget_filesize(file.id(), &fileSize) < 0)
+        return libraryFailure(QStringLiteral("cannot be checked"));
+    // A claim that is too large for the type becomes a negative one.
+    Result plausible = checkStored(static_cast<qint64>(size), static_cast<qint64>(fileSize), mForm);
     if (plausible.bad())
         return plausible;
     QByteArray stored(static_cast<int>(size), Qt::Uninitialized);
@@ -159,44 +164,29 @@ Result ChunkedData::readChunk(const QVector<hsize_t>& start, QByteArray& bytes) 
     unsigned skippedFilters = 0;
     if (H5Dread_chunk(mDataset.id(), H5P_DEFAULT, start.constData(), &skippedFilters, stored.data()) < 0)
         return libraryFailure(QStringLiteral("cannot be read"));
-    return decode(stored, skippedFilters, bytes);
+    return decodeChunk(stored, skippedFilters, mForm, bytes);
 }
 
-Result ChunkedData::checkStored(hsize_t stored) const
+Result ChunkedData::locateChunk(const QVector<hsize_t>& start, ChunkPlace& place) const
 {
-    if (stored == 0)
-        return Result::failure(QStringLiteral("is not in the file"));
-    // A length that cannot be is refused before memory is taken for it.
-    const Handle file(H5Iget_file_id(mDataset.id()), H5Fclose);
-    hsize_t fileSize = 0;
-    if (H5Fget_filesize(file.id(), &fileSize) < 0)
-        return libraryFailure(QStringLiteral("cannot be checked"));
-    const auto most = static_cast<hsize_t>(mChunkBytes + mChunkBytes / 16 + kMaxOverhead);
-    if (stored > fileSize || stored > most || !canInflate(static_cast<qint64>(stored), mChunkBytes))
-        return Result::failure(QStringLiteral("claims %1 bytes for %2").arg(stored).arg(mChunkBytes));
-    return {};
-}
-
-/// Undoes the filters in the reverse order of writing: first the compression, then the shuffling.
-Result ChunkedData::decode(const QByteArray& stored, unsigned skippedFilters, QByteArray& bytes) const
-{
-    // Other writers store a chunk as it is when a filter gains nothing, and mark the filter by its place.
-    const unsigned deflate = mIsShuffled ? 2 : 1;
-    const bool isShuffled = mIsShuffled && (skippedFilters & 1U) == 0;
-    const QByteArray content = (skippedFilters & deflate) != 0 ? stored : inflated(stored, mChunkBytes);
-    // What was stored uncompressed has not been held against its exact size yet.
-    if (content.size() != mChunkBytes)
-        return Result::failure(QStringLiteral("is damaged"));
-    bytes = isShuffled ? unshuffled(content, mElementSize) : content;
+    unsigned skippedFilters = 0;
+    haddr_t offset = HADDR_UNDEF;
+    hsize_t size = 0;
+    if (H5Dget_chunk_info_by_coord(mDataset.id(), start.constData(), &skippedFilters, &offset, &size) < 0)
+        return libraryFailure(QStringLiteral("cannot be found"));
+    const auto most = static_cast<quint64>(std::numeric_limits<qint64>::max());
+    const bool isThere = offset != HADDR_UNDEF && offset <= most && size <= most;
+    place = isThere ? ChunkPlace{static_cast<qint64>(offset), static_cast<qint64>(size), skippedFilters}
+                    : ChunkPlace();
     return {};
 }
 
 Result ChunkedData::writeChunk(const QVector<hsize_t>& start, const QByteArray& bytes)
 {
-    if (bytes.size() != mChunkBytes)
+    if (bytes.size() != mForm.chunkBytes)
         return Result::failure(
-            QStringLiteral("has %1 bytes instead of %2").arg(bytes.size()).arg(mChunkBytes));
-    const QByteArray stored = deflated(mIsShuffled ? shuffled(bytes, mElementSize) : bytes);
+            QStringLiteral("has %1 bytes instead of %2").arg(bytes.size()).arg(mForm.chunkBytes));
+    const QByteArray stored = deflated(mForm.isShuffled ? shuffled(bytes, mForm.elementSize) : bytes);
     if (stored.isEmpty())
         return Result::failure(QStringLiteral("cannot be compressed"));
     // As filtered here; the mask 0 says that no filter was left out.

@@ -1,6 +1,7 @@
 #pragma once
 
 #include "platform/base/Result.h"
+#include "platform/volumefile/ChunkCoding.h"
 #include "platform/volumefile/Hdf5.h"
 
 #include <QByteArray>
@@ -31,6 +32,11 @@ public:
     /// The chunk that begins at `start`, which lies in the dataset. An absent chunk is a failure.
     Result readChunk(const QVector<hsize_t>& start, QByteArray& bytes) const;
 
+    /// Where that chunk is stored; nowhere when it is absent.
+    Result locateChunk(const QVector<hsize_t>& start, ChunkPlace& place) const;
+
+    const ChunkForm& form() const { return mForm; }
+
     /// `bytes` are as many as a chunk has.
     Result writeChunk(const QVector<hsize_t>& start, const QByteArray& bytes);
 
@@ -40,16 +46,12 @@ private:
     Result readFilters(hid_t properties);
     Result readDims();
     bool setChunkBytes();
-    Result checkStored(hsize_t stored) const;
-    Result decode(const QByteArray& stored, unsigned skippedFilters, QByteArray& bytes) const;
 
     Handle mDataset;
     Handle mType;
     QVector<hsize_t> mDims;
     QVector<hsize_t> mChunk;
-    int mElementSize = 0;
-    int mChunkBytes = 0;
-    bool mIsShuffled = false;  // the filter before the compression, if there is one
+    ChunkForm mForm;
 };
 
 /// The number of elements; 0 when one of the dimensions is, or when there are more than `limit`.

@@ -7,6 +7,7 @@
 #include <CLI/CLI.hpp>
 #include <dcmtk/oflog/oflog.h>
 #include <kddlib/BuildInfo.h>
+#include <kddlib/DecoderPlace.h>
 #include <kddlib/ExResource.h>
 #include <kddlib/Kxg.h>
 #include <kddlib/LogFile.h>
@@ -69,6 +70,8 @@ const GlobalOptions& GlobalArguments::apply()
     // First, so that whatever is logged from here on is written as it was asked for.
     applyLogging();
     applyStore();
+    // What files hold came from anywhere.
+    setDecoderPlace(DecoderPlace::Apart);
     return mOptions;
 }
 

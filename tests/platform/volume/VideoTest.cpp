@@ -1,3 +1,5 @@
+#include "platform/decoder/DecoderPool.h"
+#include "platform/volume/ApartVideo.h"
 #include "platform/volume/KxCompressedDataMedia.h"
 #include "support/BytesRead.h"
 #include "support/FileContent.h"
@@ -6,6 +8,7 @@
 #include <QProcess>
 
 #include <cstdlib>
+#include <cstring>
 
 using namespace Kdd;
 
@@ -86,6 +89,46 @@ TEST_F(Video, OfEveryFormatGivesTheFrameAtTheWantedTime)
         EXPECT_GT(colour(frame, 9, 9, 1), 240);
         EXPECT_LT(colour(frame, 9, format.height - 9, 1), 20);
     }
+}
+
+/// Bytes of which no more than a few are given at a time, as fragments of a dataset are.
+class ShortReads : public MediaSource
+{
+public:
+    explicit ShortReads(QByteArray bytes)
+        : mBytes(std::move(bytes))
+    {
+    }
+    qint64 size() const override { return mBytes.size(); }
+    qint64 read(qint64 offset, char* out, qint64 length) override
+    {
+        const QByteArray part = mBytes.mid(int(offset), int(qMin<qint64>(length, 1000)));
+        std::memcpy(out, part.constData(), size_t(part.size()));
+        return part.size();
+    }
+
+private:
+    QByteArray mBytes;
+};
+
+TEST_F(Video, IsTheSameWhenItIsDecodedApart)
+{
+    for (const Format& format : kFormats) {
+        ShortReads source(fileContent(make(format.name, format.encoder)));
+        const VideoPlace place = {160, 160, 0.7};
+        TypedData2D inside;
+        TypedData2D apart;
+        ASSERT_TRUE(decodeVideoInside(source, place, inside).good()) << format.name;
+        const Result result = decodeVideoApart(DecoderPool::ofProcess(), source, place, apart);
+        EXPECT_TRUE(result.good()) << format.name << qPrintable(result.text());
+        EXPECT_EQ(apart.width, inside.width) << format.name;
+        EXPECT_TRUE(apart.pixels == inside.pixels) << format.name;
+    }
+    ShortReads nothing("no video");
+    TypedData2D inside;
+    TypedData2D apart;
+    EXPECT_EQ(decodeVideoApart(DecoderPool::ofProcess(), nothing, {9, 9, 0}, apart).text().toStdString(),
+              decodeVideoInside(nothing, {9, 9, 0}, inside).text().toStdString());
 }
 
 TEST_F(Video, EndsWithItsLastFrameAndIsNeverEnlarged)
