@@ -64,6 +64,12 @@ const Attempt kAttempts[] = {
          return isForbidden(::setrlimit(RLIMIT_CPU, &more));
      },
      1},
+    {"LimitItsParent",
+     [] {
+         const rlimit less = {1 << 20, 1 << 20};
+         return isForbidden(::prlimit(::getppid(), RLIMIT_AS, &less, nullptr));
+     },
+     1},
     {"OpenASocket", [] { return ::socket(AF_INET, SOCK_STREAM, 0) >= 0; }, -SIGSYS},
     {"StartAProgram", [] { return ::execl("/bin/true", "true", nullptr) == 0; }, -SIGSYS},
     {"CopyItself", [] { return ::fork() >= 0; }, -SIGSYS},

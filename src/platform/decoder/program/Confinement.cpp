@@ -120,8 +120,10 @@ Result filterCalls()
     filter.allow(SYS_clock_gettime);
     filter.allow(SYS_gettimeofday);
     filter.allow(SYS_setitimer);
-    // Its own memory only, which does not go beyond the hard limit.
-    filter.allowWith(SYS_prlimit64, 1, RLIMIT_AS);
+    // Of its memory, which does not go beyond the hard limit. What the C library calls in place of these could limit other
+    // processes of the same user too.
+    filter.allowWith(SYS_getrlimit, 0, RLIMIT_AS);
+    filter.allowWith(SYS_setrlimit, 0, RLIMIT_AS);
     if (kIsCheckedBuild) {
         // By these checkers find out whether an address may be read, and where a signal's stack is when one is left.
         filter.allow(SYS_sigaltstack);
@@ -190,11 +192,11 @@ long long takenMemory()
 void limitMemory(long long bytes)
 {
     rlimit both = {};
-    if (kIsCheckedBuild || ::getrlimit(RLIMIT_AS, &both) != 0)
+    if (kIsCheckedBuild || ::syscall(SYS_getrlimit, RLIMIT_AS, &both) != 0)
         return;
     both.rlim_cur =
         std::min(both.rlim_max, static_cast<rlim_t>(takenMemory() + std::min(bytes, kMostMemory)));
-    ::setrlimit(RLIMIT_AS, &both);
+    ::syscall(SYS_setrlimit, RLIMIT_AS, &both);
 }
 
 // Not by alarm(), which is a system call of some machines only.

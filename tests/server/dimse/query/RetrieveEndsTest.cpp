@@ -20,6 +20,8 @@ protected:
     {
         mDestination.kill();
         mDestination.waitForFinished(-1);
+        // It logs until it ends, and the capture of the log ends first.
+        mServer.reset();
     }
 
     /// DCMTK's storescp, with options of its own.
