@@ -5,7 +5,8 @@ machine nor its load tell.
     bench/profile.py BUILD-FOLDER [IMAGES] [PATH ...]
 
 A CT study of so many images (1,000) is taken in by `index` and by `add`, `merge` brings one image more, `stat` reads it and
-`metadata` writes it as DICOM JSON. Of each path those functions are told that need, with what they call, the most.
+`metadata` writes it as DICOM JSON. Of each path those functions are told that need, with what they call, the most, but for
+such as do nothing else than to call one.
 """
 import os
 import re
@@ -17,8 +18,9 @@ import tempfile
 from servers import ImageTemplate, ct_slices
 
 SIDE = 64  # rows and columns: it is the headers that are asked for
-TOLD = 16  # functions
+TOLD = 12  # functions
 LEAST = 3.0  # of a hundred instructions
+WRAPPER = 0.3  # likewise: what does so little itself is not told beside what it calls
 LINE = re.compile(r"^ *([\d,]+) \( *([\d.]+)%\) +\S*?:((?:Kdd|Kxg)::.*?)(?: \[[^\]]*\])?$")
 
 
@@ -63,14 +65,15 @@ def report(title, count, lines):
     total = next(int(line.split()[0].replace(",", "")) for line in lines if "PROGRAM TOTALS" in line)
     print("\n**%s**: %s million instructions, %s thousand for an image\n\n| instructions | in |\n| --: | --- |"
           % (title, "{:,}".format(round(total / 1e6)), "{:,}".format(round(total / count / 1e3))))
-    told = set()
+    told, last = set(), 100.0
     for found in filter(None, map(LINE.match, lines)):
-        name = name_of(found[3])
-        if float(found[2]) < LEAST or len(told) == TOLD:
+        name, share = name_of(found[3]), int(found[1].replace(",", "")) * 100 / total
+        if share < LEAST or len(told) == TOLD:
             break
-        if name not in told and name != "run":
+        if name != "run" and name not in told and last - share > WRAPPER:
             told.add(name)
-            print("| %.0f %% | `%s` |" % (float(found[2]), name))
+            last = share
+            print("| %.0f %% | `%s` |" % (share, name))
 
 
 def main():
