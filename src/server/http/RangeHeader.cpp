@@ -34,7 +34,8 @@ WantedBytes wantedBytes(const Request& request, qint64 size, const QByteArray& e
     const QByteArray to = range.mid(dash + 1).trimmed();
     qint64 first = 0;
     qint64 last = size - 1;
-    const bool isUnderstood = dash >= 6 && (from.isEmpty() ? readNumber(to, last) : readNumber(from, first)) &&
+    const bool isUnderstood = dash >= 6 &&
+                              (from.isEmpty() ? readNumber(to, last) : readNumber(from, first)) &&
                               (from.isEmpty() || to.isEmpty() || readNumber(to, last)) &&
                               (from.isEmpty() || first <= last || to.isEmpty());
     if (!isUnderstood)

@@ -12,8 +12,9 @@ namespace
 
 constexpr quint16 kVersionLarge = 45;       // that knows 64-bit sizes
 constexpr quint16 kSizesFollow = 1U << 3U;  // behind the file
-constexpr quint16 kDate = (1U << 5U) | 1U;  // the first day there is: what is made on request has no date of its own
-constexpr quint32 kEscape = 0xffffffff;     // the value stands in the extra field
+constexpr quint16 kDate =
+    (1U << 5U) | 1U;  // the first day there is: what is made on request has no date of its own
+constexpr quint32 kEscape = 0xffffffff;  // the value stands in the extra field
 constexpr quint16 kLargeField = 0x0001;
 
 class Record

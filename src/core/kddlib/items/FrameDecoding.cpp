@@ -13,11 +13,10 @@ namespace
 
 /// Of those that decodeFrame has a decoder for. What it would have none for is told before bytes are sent.
 constexpr const char* kDecoded[] = {
-    "1.2.840.10008.1.2.4.50",  "1.2.840.10008.1.2.4.51",  "1.2.840.10008.1.2.4.53",
-    "1.2.840.10008.1.2.4.55",  "1.2.840.10008.1.2.4.57",  "1.2.840.10008.1.2.4.70",
-    "1.2.840.10008.1.2.4.80",  "1.2.840.10008.1.2.4.81",  "1.2.840.10008.1.2.4.90",
-    "1.2.840.10008.1.2.4.91",  "1.2.840.10008.1.2.4.201", "1.2.840.10008.1.2.4.202",
-    "1.2.840.10008.1.2.4.203", "1.2.840.10008.1.2.5",     "1.2.840.10008.1.2.8.1",
+    "1.2.840.10008.1.2.4.50",  "1.2.840.10008.1.2.4.51", "1.2.840.10008.1.2.4.53",  "1.2.840.10008.1.2.4.55",
+    "1.2.840.10008.1.2.4.57",  "1.2.840.10008.1.2.4.70", "1.2.840.10008.1.2.4.80",  "1.2.840.10008.1.2.4.81",
+    "1.2.840.10008.1.2.4.90",  "1.2.840.10008.1.2.4.91", "1.2.840.10008.1.2.4.201", "1.2.840.10008.1.2.4.202",
+    "1.2.840.10008.1.2.4.203", "1.2.840.10008.1.2.5",    "1.2.840.10008.1.2.8.1",
 };
 
 constexpr qint64 fixed(double factor)
@@ -77,7 +76,8 @@ bool FrameIndex::canDecode() const
 /// Decoders of JPEG and JPEG 2000 give RGB or what is made RGB below; the others leave colours as they are.
 QByteArray FrameIndex::decodedPhotometric() const
 {
-    const bool isConverted = d->isEncapsulated && d->layout.samples == 3 && !keepsColour(d->transferSyntaxUID);
+    const bool isConverted =
+        d->isEncapsulated && d->layout.samples == 3 && !keepsColour(d->transferSyntaxUID);
     return isConverted ? QByteArray("RGB") : d->layout.photometric;
 }
 

@@ -2,7 +2,6 @@
 
 #include "server/http/AcceptHeader.h"
 
-#include <QList>
 #include <QCryptographicHash>
 #include <QList>
 

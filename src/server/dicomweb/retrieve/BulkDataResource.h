@@ -25,7 +25,8 @@ public:
 
 private:
     Http::Response answerAll(const Http::AcceptHeader& accept, const ResourcePath& path,
-                             const std::shared_ptr<const ServedStudy>& study, const QVector<ListedImage>& images);
+                             const std::shared_ptr<const ServedStudy>& study,
+                             const QVector<ListedImage>& images);
 
     std::shared_ptr<StudyShelf> mStudies;
     std::shared_ptr<ObjectShelf> mObjects;

@@ -34,7 +34,9 @@ Verdict checkFrames(const FrameIndex& index, const QVector<int>& frames)
         return {404, QStringLiteral("The instance has no pixels")};
     for (int frame : frames) {
         if (frame < 0 || frame >= index.frames())
-            return {404, QStringLiteral("There is no frame %1 among %2").arg(qint64(frame) + 1).arg(index.frames())};
+            return {
+                404,
+                QStringLiteral("There is no frame %1 among %2").arg(qint64(frame) + 1).arg(index.frames())};
     }
     return {};
 }

@@ -4,9 +4,9 @@
 #include "server/dicomweb/StudyShelf.h"
 #include "server/dicomweb/retrieve/Verdict.h"
 
-#include <kddlib/CorrectedDataset.h>
-
 #include <QVector>
+
+#include <kddlib/CorrectedDataset.h>
 
 #include <memory>
 

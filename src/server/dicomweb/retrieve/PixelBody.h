@@ -20,7 +20,8 @@ Verdict noSuitablePixels(const FrameIndex& index);
 Verdict damagedFrame(int frame, const Result& result);
 
 /// Appends a frame (0-based) in that form to a body. Stored bytes are left where they lie until they are sent.
-Verdict appendFrame(const FoundObject& object, int frame, const PixelForm& form, std::vector<Http::BodyPart>& body);
+Verdict appendFrame(const FoundObject& object, int frame, const PixelForm& form,
+                    std::vector<Http::BodyPart>& body);
 
 /// Decodes the frames of an object one after another, as they are sent.
 class FramesProducer : public Http::Producer

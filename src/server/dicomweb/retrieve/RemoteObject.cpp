@@ -56,8 +56,8 @@ public:
         if (mStretch.length == 0)
             return {};
         if (mStream == nullptr) {
-            mStream = std::make_unique<KxCurlDownloadStream>(KxCurlClient::instance().readRange(
-                mUrl, rangeText(mStretch.offset, mStretch.length), false));
+            mStream = std::make_unique<KxCurlDownloadStream>(
+                KxCurlClient::instance().readRange(mUrl, rangeText(mStretch.offset, mStretch.length), false));
             const Result answered = check(*mStream, mVersion, mSize);
             if (answered.bad())
                 return answered;
@@ -115,8 +115,7 @@ qint64 RemoteObject::read(qint64 offset, char* out, qint64 length)
         return 0;
     const bool isHere = offset >= mStart && offset < mStart + mWindow.size();
     if (!isHere) {
-        RemoteProducer producer(mUrl, mVersion, mSize,
-                                {offset, qMin(qMax(length, kWindow), mSize - offset)});
+        RemoteProducer producer(mUrl, mVersion, mSize, {offset, qMin(qMax(length, kWindow), mSize - offset)});
         if (producer.next(mWindow).bad())
             mWindow.clear();
         mStart = offset;
@@ -133,7 +132,8 @@ QByteArray RemoteObject::identity() const
 {
     if (!mVersion.isKnown())
         return {};
-    const std::string version = mVersion.entityTag + '\n' + mVersion.generation + '\n' + mVersion.lastModified;
+    const std::string version =
+        mVersion.entityTag + '\n' + mVersion.generation + '\n' + mVersion.lastModified;
     return QByteArray::number(mSize) + '\n' + QByteArray::fromStdString(version);
 }
 
