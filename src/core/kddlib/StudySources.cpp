@@ -114,13 +114,13 @@ Result StudySources::queryImages()
     return result;
 }
 
-/// A file that was registered without SOP Instance UID is taken for what it is: nothing was said of it.
+/// Of a file that was registered without SOP Instance UID only the series was said.
 bool StudySources::isListed(const TagMap& image, const QByteArray& path) const
 {
     const auto listed = mListed.constFind(path);
-    if (listed == mListed.cend() || listed->key == path)
+    if (listed == mListed.cend())
         return true;
-    return image.uid(TagMap::ImageLevel) == listed->key &&
+    return (listed->key == path || image.uid(TagMap::ImageLevel) == listed->key) &&
            (listed->seriesUID.isEmpty() || image.uid(TagMap::SeriesLevel) == listed->seriesUID);
 }
 

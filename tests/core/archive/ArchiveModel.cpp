@@ -212,10 +212,10 @@ bool ArchiveModel::build(const std::string& study)
         const std::string& path = image.second.path;
         const auto file = mDisk.find(path);
         const ModelFile& known = image.second.shows;
-        // Of a file that was registered without UID nothing is known that it could contradict.
-        const bool isThat =
-            file != mDisk.end() && file->second.study == known.study &&
-            (known.sop.empty() || (file->second.series == known.series && file->second.sop == known.sop));
+        // What was registered without UID has none that it could contradict.
+        const bool isThat = file != mDisk.end() && file->second.study == known.study &&
+                            file->second.series == known.series &&
+                            (known.sop.empty() || file->second.sop == known.sop);
         if (isThat) {
             const std::string key = keyOf(path, file->second);
             content[key] = {path, edited(key, file->second)};

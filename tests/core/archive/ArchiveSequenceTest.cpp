@@ -256,6 +256,17 @@ TEST_F(FixedSequence, AnEditLeavesAnImageInTheSeriesOfItsFile)
     expectHealed();
 }
 
+TEST_F(FixedSequence, AFileWithoutImageUidIsNotTakenFromAnotherSeriesThanItWasRegisteredIn)
+{
+    at("9", {"1.1", "1.1.7", "", "Doe^1", "1"});
+    add(root());
+    at("9", {"1.1", "1.1.8", "", "Doe^2", "2"});
+    buildAll(true);
+    expectAgreement();
+    add(root());
+    expectHealed();
+}
+
 TEST_F(FixedSequence, ASyncFollowsAFileIntoASeriesThatIsNotBuilt)
 {
     at("9", {"1.1", "1.1.7", "9.1", "Doe^1", "1"});
