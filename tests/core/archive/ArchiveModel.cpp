@@ -340,8 +340,12 @@ bool ArchiveModel::sync(const std::string& study)
         if (listed != wanted.end())
             content[image.first] = {listed->second.path, image.second.shows};
     }
-    if (content.empty())
+    if (content.empty()) {
+        // Nothing of it is listed any more, and without images it is not written: it has to be built.
+        mWaiting.insert(study);
+        mChanged.insert(study);
         return false;
+    }
     put(study, content);
     mMarked.insert(study);
     if (!wasTrusted)

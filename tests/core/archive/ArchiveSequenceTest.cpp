@@ -287,6 +287,19 @@ TEST_F(FixedSequence, ASyncedOldTagFileWaitsToBeBuilt)
     expectHealed();
 }
 
+TEST_F(FixedSequence, AnOldTagFileOfWhichNothingIsLeftWaitsToBeBuilt)
+{
+    keepCopy("1.1");
+    remove("1.1", "", "9.1");
+    remove("1.1", "", "9.2");
+    at("3", image("9.4"));
+    add(root());
+    restore("1.1");
+    sync("1.1");
+    expectAgreement();
+    expectHealed();
+}
+
 TEST_F(FixedSequence, AFileThatIsAnotherImageOrGoneIsKeptUntilThereIsOne)
 {
     cut("1.1", 0);
