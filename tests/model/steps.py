@@ -360,15 +360,18 @@ class Sequence:
         return self.heal([[made[1]], [made[1], made[1]]])
 
     def heal(self, orders):
-        """Whatever happened in between, a build of all leaves the archive as one of these orders does."""
+        """Whatever happened in between, a build of all leaves the archive as one of these orders does. What was merged is built
+        then, as only chance has it whether it was."""
         self.site.run("build", "--all")
+        self.site.run("build", "--settle")
         faults, began = [], self.model
         for order in orders:
             self.model = copy.deepcopy(began)
             for change in order:
                 change(self.model)
             self.model.build_all()
-            # Whether it was merged or built is a matter of chance, and so is how it is compressed.
+            self.model.settle()
+            # So is how it is compressed.
             self.model.uncertain |= set(STUDIES)
             try:
                 return compare(self, False)
