@@ -132,6 +132,12 @@ SystemResult flushFile(const QByteArray& path)
     return flushed;
 }
 
+SystemResult flushNamedFile(const QByteArray& path)
+{
+    const SystemResult flushed = flushFile(path);
+    return flushed.good() ? flushFolder(path.left(path.lastIndexOf('/'))) : flushed;
+}
+
 SystemResult readChecksum(const QByteArray& path, quint32& checksum)
 {
     RandomAccessFile file;

@@ -62,6 +62,9 @@ SystemResult flushFolder(const QByteArray& path);
 /// What is in a file is on the disk from here on.
 SystemResult flushFile(const QByteArray& path);
 
+/// What is in a file is on the disk from here on, and so is its name.
+SystemResult flushNamedFile(const QByteArray& path);
+
 /// The checksum of a file (CRC-32).
 SystemResult readChecksum(const QByteArray& path, quint32& checksum);
 

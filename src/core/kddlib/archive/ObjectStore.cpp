@@ -254,9 +254,7 @@ Result ObjectStore::Private::recoverFile(const QByteArray& path, Kxg::Catalogue&
 /// It may only be whole in memory yet.
 Result ObjectStore::Private::takeIn(const QByteArray& place, Kxg::Catalogue& catalogue)
 {
-    Result result = flushFile(place);
-    if (result.good())
-        result = flushFolder(place.left(place.lastIndexOf('/')));
+    Result result = flushNamedFile(place);
     std::vector<DicomInput> images;
     images.push_back(readDicomInput(place, Damage::Refused));
     if (result.bad() || images[0].kind != DicomInput::Kind::Image)

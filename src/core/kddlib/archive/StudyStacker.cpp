@@ -4,6 +4,7 @@
 #include "kddlib/archive/ContentDigest.h"
 #include "kddlib/archive/FileWalk.h"
 #include "kddlib/archive/StudyCompletion.h"
+#include "kddlib/tagfile/StudyFile.h"
 #include "kddlib/tagfile/TagFile.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
@@ -30,14 +31,6 @@ QString folderOf(const QByteArray& studyUID, const QString& volumes)
     const QString place = tagFile.mid(pathText(TagFile::metaFolder()).size());
     return pathText(absolutePath(pathBytes(volumes))) + QLatin1Char('/') +
            place.left(place.lastIndexOf(QLatin1Char('.')));
-}
-
-Result flushVolume(const QByteArray& path, const QByteArray& folder)
-{
-    SystemResult flushed = flushFile(path);
-    if (flushed.good())
-        flushed = flushFolder(folder);
-    return flushed.good() ? Result() : Result(flushed).within(QStringLiteral("cannot be flushed"));
 }
 
 }  // namespace
@@ -145,14 +138,13 @@ bool StudyStacker::clearSeries(const QByteArray& seriesUID, const TagMap& series
 
 Result StudyStacker::writeVolume(const QByteArray& seriesUID, const Stack& stack, int index)
 {
-    const bool isFlushed = TagFile::durability() == TagFile::Durability::PowerLoss;
-    if (isFlushed ? makeLastingFolder(pathBytes(mFolder)).bad() : !makeFolder(mFolder))
+    if (!makeStudyFolder(mFolder))
         return Result::failure(QStringLiteral("Could not create folder %1").arg(mFolder));
     const QByteArray path = volumePath(seriesUID, index);
     Result written = writeStack(stack, filePathOf, path);
     // The database will name the file, and its row is flushed always.
-    if (written.good() && isFlushed)
-        written = flushVolume(path, pathBytes(mFolder));
+    if (written.good() && TagFile::durability() == TagFile::Durability::PowerLoss)
+        written = Result(flushNamedFile(path)).within(QStringLiteral("cannot be flushed"));
     FileStatus status;
     if (written.good() && !statusOf(path.constData(), status))
         return Result::failure(QStringLiteral("Volume file %1 is gone again").arg(pathText(path)));

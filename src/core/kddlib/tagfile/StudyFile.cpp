@@ -45,14 +45,12 @@ Flush flushing()
                                                                                    : Flush::Process;
 }
 
-/// A write flushes the file's name and its bytes, which are of no use where the folder's own name is lost.
-bool makeFolderFor(const QString& path)
-{
-    const QString folder = QFileInfo(path).path();
-    return flushing() == Flush::Disk ? makeLastingFolder(pathBytes(folder)).good() : makeFolder(folder);
-}
-
 }  // namespace
+
+bool makeStudyFolder(const QString& path)
+{
+    return flushing() == Flush::Disk ? makeLastingFolder(pathBytes(path)).good() : makeFolder(path);
+}
 
 LockedOpenResult StudyFile::open(const QString& path, Access access)
 {
@@ -65,7 +63,7 @@ LockedOpenResult StudyFile::open(const QString& path, Access access)
     LockedOpenResult opened = attempt();
     if (opened || opened.failure == OpenFailure::Locked || !makesFile(access))
         return opened;
-    if (!makeFolderFor(path)) {
+    if (!makeStudyFolder(QFileInfo(path).path())) {
         opened.failure = OpenFailure::NotFound;
         return opened;
     }

@@ -74,4 +74,8 @@ private:
     QString mPath;
 };
 
+/// Makes a folder for what is kept of a study, with all above it; its name is flushed where writes are, for they would be of no
+/// use without it. False when it cannot be made.
+bool makeStudyFolder(const QString& path);
+
 }  // namespace Kdd
