@@ -38,6 +38,7 @@ public:
                       IfAbsent ifAbsent) override;
     Kdd::Result claimRested(const QSet<int>& except, int restMs, std::unique_ptr<StudyClaim>& claim) override;
     Kdd::Result additions(const QByteArray& studyUID, QVector<qint64>& requests) override;
+    Kdd::Result awaitsObjects(const QByteArray& studyUID, const QByteArray& folder, bool& awaits) override;
     Kdd::Result dropKnown(QSet<QByteArray>& paths) override;
     Kdd::Result stampsOf(const QList<QByteArray>& paths, QHash<QByteArray, FileStamp>& stamps) override;
     Kdd::Result finishRequests(const QVector<qint64>& requests) override;

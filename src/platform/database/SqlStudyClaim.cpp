@@ -30,12 +30,6 @@ QVector<qint64> requestsOf(SqlConnection& connection, qint64 studyId)
     return requests;
 }
 
-void deleteRequests(SqlConnection& connection, const QVector<qint64>& requests)
-{
-    for (const qint64 request : requests)
-        connection.change("DELETE FROM build_request WHERE id = ?", {request});
-}
-
 /// A study as it is once it is locked.
 struct LockedStudy
 {
@@ -93,7 +87,7 @@ public:
         return conclude(built.isComplete ? mStudy.requests : QVector<qint64>(), [&] {
             keep(built);
             if (!built.isComplete)
-                keepWaiting();
+                keepUnread();
             if (built.settleAt > 0)
                 leaveRequest(mConnection, mStudyId, built.settleAt);
         });
@@ -164,6 +158,14 @@ private:
         mConnection.change("UPDATE build_request SET adds = 0 WHERE study_id = ? AND adds = 1", {mStudyId});
     }
 
+    /// Whoever looks at the study need not have this tried once more.
+    void keepUnread()
+    {
+        keepWaiting();
+        for (const qint64 request : qAsConst(mStudy.requests))
+            mConnection.change("UPDATE build_request SET adds = -1 WHERE id = ?", {request});
+    }
+
     void keepSearch(const BuiltStudy& built)
     {
         const SearchRowState row = searchRowOf(mConnection, mStudyId);
@@ -228,7 +230,7 @@ std::vector<Request> pageOfQueue(SqlConnection& connection, qint64 last, qint64 
     std::vector<Request> page;
     connection.transact(SqlConnection::Access::Read, [&] {
         SqlRows rows = connection.ask("SELECT id, study_id FROM build_request WHERE id > ? AND due <= ?"
-                                      " AND (adds = 0 OR since <= ?) ORDER BY id LIMIT ?",
+                                      " AND (adds <> 1 OR since <= ?) ORDER BY id LIMIT ?",
                                       {last, presentMs(), addedUntil, kPageOfQueue});
         while (rows.next())
             page.push_back({rows.number(0), rows.number(1)});
@@ -323,34 +325,6 @@ std::unique_ptr<StudyClaim> tryClaim(SqlConnection& connection, std::unique_ptr<
 
 }  // namespace
 
-Kdd::Result SqlCatalogue::requestBuild(const QVector<QByteArray>& studyUIDs, IfGone ifGone)
-{
-    return transact(Access::Write, [&] {
-        // An absent study has the id 0, for which no request is left.
-        for (const QByteArray& uid : studyUIDs)
-            leaveRequest(mConnection, ifGone == IfGone::PassOver ? findStudyId(mConnection, uid)
-                                                                 : obtainStudyId(mConnection, uid));
-    });
-}
-
-Kdd::Result SqlCatalogue::settleNow()
-{
-    return transact(Access::Write, [&] {
-        if (mConnection.change("UPDATE build_request SET due = 0 WHERE due > 0") > 0)
-            tellOfWork(mConnection);
-    });
-}
-
-Kdd::Result SqlCatalogue::countWaiting(int& studies)
-{
-    return transact(Access::Read, [&] {
-        SqlRows rows = mConnection.ask("SELECT COUNT(DISTINCT study_id) FROM build_request WHERE due <= ?",
-                                       {presentMs()});
-        if (rows.next())
-            studies = static_cast<int>(rows.number(0));
-    });
-}
-
 Kdd::Result SqlCatalogue::claimNext(const QSet<int>& except, std::unique_ptr<StudyClaim>& claim)
 {
     claim.reset();
@@ -366,20 +340,6 @@ Kdd::Result SqlCatalogue::claimRested(const QSet<int>& except, int restMs, std::
                    [&] { claim = QueueWalk(mConnection, presentMs() - restMs).claimFirst(except); });
 }
 
-Kdd::Result SqlCatalogue::additions(const QByteArray& studyUID, QVector<qint64>& requests)
-{
-    return transact(Access::Read, [&] {
-        QVector<qint64> found;
-        SqlRows rows = mConnection.ask("SELECT build_request.id FROM build_request JOIN study"
-                                       " ON study.id = build_request.study_id"
-                                       " WHERE study.uid = ? AND adds = 1 ORDER BY build_request.id",
-                                       {textValue(studyUID)});
-        while (rows.next())
-            found.push_back(rows.number(0));
-        requests.swap(found);
-    });
-}
-
 Kdd::Result SqlCatalogue::claim(const QByteArray& studyUID, int patienceMs,
                                 std::unique_ptr<StudyClaim>& claim, IfAbsent ifAbsent)
 {
@@ -393,11 +353,6 @@ Kdd::Result SqlCatalogue::claim(const QByteArray& studyUID, int patienceMs,
         while (!(claim = tryClaim(mConnection, lock, studyUID, ifAbsent)) && waited.elapsed() < patienceMs)
             QThread::msleep(kPause);
     });
-}
-
-Kdd::Result SqlCatalogue::finishRequests(const QVector<qint64>& requests)
-{
-    return transact(Access::Write, [&] { deleteRequests(mConnection, requests); });
 }
 
 }  // namespace Kxg

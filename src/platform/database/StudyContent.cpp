@@ -70,6 +70,12 @@ qint64 leaveRequest(SqlConnection& connection, qint64 studyId, qint64 due, Reaso
     return request;
 }
 
+void deleteRequests(SqlConnection& connection, const QVector<qint64>& requests)
+{
+    for (const qint64 request : requests)
+        connection.change("DELETE FROM build_request WHERE id = ?", {request});
+}
+
 void tellOfWork(SqlConnection& connection)
 {
     const QString& tell = SqlDialect::of(connection.address().engine).tellOfWork;

@@ -44,6 +44,9 @@ void concludeChange(SqlConnection& connection, qint64 studyId, QMap<QByteArray, 
 qint64 leaveRequest(SqlConnection& connection, qint64 studyId, qint64 due = 0,
                     Reason reason = Reason::Changed);
 
+/// Takes requests off the queue that are done.
+void deleteRequests(SqlConnection& connection, const QVector<qint64>& requests);
+
 /// Wakes those who wait for work, when the transaction comes to its end; nobody where the engine cannot.
 void tellOfWork(SqlConnection& connection);
 

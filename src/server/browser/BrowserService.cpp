@@ -115,7 +115,7 @@ Http::Response BrowserService::lookAt(const QByteArray& uid, const Look& look) c
         const DicomWeb::Arrived arrived = arrivals->bringIn(uid);
         if (arrived == DicomWeb::Arrived::Brought)
             presence = mShelf.find(uid, study);
-        else if (arrived == DicomWeb::Arrived::Waiting)
+        else if (DicomWeb::isLacking(arrived))
             presence = DicomWeb::Presence::Held;
     }
     if (presence != DicomWeb::Presence::Found)

@@ -55,8 +55,15 @@ enum class Presence {
 enum class Arrived {
     Nothing,  ///< none wait
     Brought,  ///< the tag file may show more now
-    Waiting,  ///< they could not be brought in now: what is not found may be there all the same
+    Held,     ///< others work on the study, or the database cannot be asked: they can be brought in soon
+    Stuck,    ///< nor soon: a file of the study cannot be read or written
 };
+
+/// Whether what is not found may be there all the same.
+inline bool isLacking(Arrived arrived)
+{
+    return arrived == Arrived::Held || arrived == Arrived::Stuck;
+}
 
 /// Images that have arrived and are not in their tag files yet. Called on several threads at the same time.
 class Arrivals

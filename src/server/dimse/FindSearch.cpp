@@ -13,20 +13,26 @@ namespace
 
 using namespace DicomWeb;
 
-/// Studies that have just come are known at once, but not what they consist of.
-void bringInArrivals(const SearchRequest& search, StudyShelf& shelf)
+/// Studies that have just come are known at once, but not what they consist of. False when that cannot be had now, of the study
+/// that is named.
+bool bringInArrivals(const SearchRequest& search, StudyShelf& shelf)
 {
     const bool isBelowStudies = search.level == SearchLevel::Series || search.level == SearchLevel::Instances;
     if (!isBelowStudies || shelf.arrivals() == nullptr)
-        return;
+        return true;
     const auto named =
         std::find_if(search.conditions.begin(), search.conditions.end(), [](const SearchCondition& each) {
             return each.key() == DCM_StudyInstanceUID && !each.isInItems() && each.list.size() == 1;
         });
-    if (named == search.conditions.end())
-        shelf.arrivals()->bringInOwn({});
-    else
-        shelf.arrivals()->bringIn(named->list.front().toUtf8());
+    if (named != search.conditions.end())
+        return shelf.arrivals()->bringIn(named->list.front().toUtf8()) != Arrived::Held;
+    shelf.arrivals()->bringInOwn({});
+    return true;
+}
+
+QueryEnding studyIsWritten()
+{
+    return {kBusy, QStringLiteral("A study is being written; ask again")};
 }
 
 QueryEnding endingOf(const SearchRun& run, int limit)
@@ -34,7 +40,7 @@ QueryEnding endingOf(const SearchRun& run, int limit)
     if (!run.tooBroad().isEmpty())
         return {kTooMany, run.tooBroad()};
     if (run.isHeldUp())
-        return {kBusy, QStringLiteral("A study is being written; ask again")};
+        return studyIsWritten();
     if (run.unread() > 0)
         return {kUnreadable,
                 QStringLiteral("Of %1 studies the tag files could not be read").arg(run.unread())};
@@ -52,7 +58,8 @@ QueryEnding findObjects(const SearchRequest& search, const StudyLimits& limits, 
     QString reason;
     if (!SearchPlan::make(search, plan, reason))
         return {kMisunderstood, reason};
-    bringInArrivals(search, shelf);
+    if (!bringInArrivals(search, shelf))
+        return studyIsWritten();
     QueryEnding ending;
     const QByteArray root;
     const Result result = database.ask(limits, [&](Kxg::StudySearch& connection) {

@@ -134,6 +134,46 @@ TEST_P(QueueTest, FreshArrivalsAreLeftToThoseWhoTookThem)
     EXPECT_TRUE(additions.contains(added) && !additions.contains(changed) && additions.size() == 2);
 }
 
+TEST_P(QueueTest, ObjectsAreAwaitedUntilTheyAreTriedInVain)
+{
+    const auto isAwaited = [&](const char* folder) {
+        bool awaits = false;
+        EXPECT_EQ(catalogue().awaitsObjects("1", folder, awaits).text().toStdString(), "");
+        return awaits;
+    };
+    const auto built = [](bool isComplete) {
+        BuiltStudy study;
+        study.isComplete = isComplete;
+        return study;
+    };
+    EXPECT_FALSE(isAwaited("/d"));
+    addStudies(1);
+    EXPECT_TRUE(isAwaited("/d"));
+    EXPECT_FALSE(isAwaited("/e")) << "others may wait for long";
+    // What changes the tag file as it is leaves to others what waits.
+    qint64 request = 0;
+    auto claim = claimNext();
+    ASSERT_TRUE(claim && catalogue().requestRewrite("1", request).good());
+    ASSERT_TRUE(claim->finishChange(built(true), request).good());
+    EXPECT_TRUE(isAwaited("/d"));
+    claim.reset();
+    claim = claimNext();
+    add({dicom("/d/more", "1", "1", "2")});
+    ASSERT_TRUE(claim && claim->finish(built(false)).good());
+    EXPECT_TRUE(isAwaited("/d")) << "what came meanwhile was not tried";
+    claim.reset();
+    claim = claimNext();
+    ASSERT_TRUE(claim && claim->finish(built(false)).good());
+    EXPECT_FALSE(isAwaited("/d"));
+    claim.reset();
+    EXPECT_TRUE(canClaim("1") && claimNext()) << "workers try it again";
+    add({dicom("/d/third", "1", "1", "3")});
+    EXPECT_TRUE(isAwaited("/d"));
+    claim = claimNext();
+    ASSERT_TRUE(claim && claim->finish(built(true)).good());
+    EXPECT_FALSE(isAwaited("/d"));
+}
+
 TEST_P(QueueTest, AllWhoMakeTheDatabaseAtOnceSucceed)
 {
     std::atomic<int> opened{0};

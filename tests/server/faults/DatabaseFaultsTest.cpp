@@ -75,14 +75,48 @@ TEST_P(DatabaseFaults, AreToldAndPassByThemselves)
     EXPECT_EQ(end(), 0);
 }
 
-class FrozenDatabase : public DatabaseFaults
+class DatabaseServer : public DatabaseFaults
 {
 };
 
-INSTANTIATE_TEST_SUITE_P(Engines, FrozenDatabase, testing::Values(Engine::Postgres),
+INSTANTIATE_TEST_SUITE_P(Engines, DatabaseServer, testing::Values(Engine::Postgres),
                          [](const auto&) { return std::string("Postgres"); });
 
-TEST_P(FrozenDatabase, IsNotWaitedForWithoutEnd)
+TEST_P(DatabaseServer, ThatIsAwayKeepsChangesFromBeingMade)
+{
+    addTwoStudies();
+    serve({QStringLiteral("--stow"), QStringLiteral("--corrections"), QStringLiteral("--deletions")});
+    const auto ask = [this](const QByteArray& method, const QByteArray& target, const QByteArray& type,
+                            const QByteArray& body) {
+        Client client(mAddress);
+        client.send(method + " /dicom-web/" + target + " HTTP/1.1\r\nHost: localhost\r\nContent-Type: " +
+                    type + "\r\nContent-Length: " + QByteArray::number(body.size()) + "\r\n\r\n" + body);
+        return client.reply();
+    };
+    const QByteArray object = fileContent(file("3"));
+    const auto statuses = [&] {
+        const Reply replies[] = {ask("POST", "studies", "application/dicom", object),
+                                 ask("POST", "studies/1.2/corrections?all=true", "application/json",
+                                     R"({"login": "anna", "tags": [{"tag": "00100010", "value": "Poe^J"}]})"),
+                                 ask("DELETE", "studies/1.3", "application/json", {})};
+        std::string told;
+        for (const Reply& reply : replies) {
+            told += std::to_string(reply.status) + ' ';
+            EXPECT_EQ(reply.status == 503, !reply.header("Retry-After").isEmpty());
+        }
+        return told;
+    };
+    takeAway();
+    EXPECT_EQ(statuses(), "503 503 503 ");
+    bringBack();
+    EXPECT_FALSE(get("studies/1.2/metadata").body.contains("Poe^J"));
+    EXPECT_EQ(get("studies/1.3/metadata").status, 200);
+    EXPECT_EQ(statuses(), "200 200 200 ");
+    EXPECT_TRUE(get("studies/1.2/metadata").body.contains("Poe^J"));
+    EXPECT_EQ(end(), 0);
+}
+
+TEST_P(DatabaseServer, IsNotWaitedForWithoutEnd)
 {
     const Setting patience("KDD_DATABASE_PATIENCE", "2");
     addTwoStudies();

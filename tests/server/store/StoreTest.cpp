@@ -174,6 +174,24 @@ TEST_F(StoreTest, WhatOneServerStoredAnotherOneFindsAtOnce)
     }
 }
 
+TEST_F(StoreTest, TellsNothingIncompleteOfAStudyThatAnotherOneWorksOn)
+{
+    Result result;
+    std::unique_ptr<Kxg::StudyClaim> claim;
+    start();
+    ASSERT_EQ(store(anImage("1.2.3.1")).status, 200);
+    ASSERT_EQ(instances("1.2"), 1);
+    const auto catalogue = Kxg::Catalogue::open(Kxg::DatabaseServer(), result);
+    ASSERT_TRUE(catalogue->claim("1.2", 5000, claim).good() && claim != nullptr);
+    ASSERT_EQ(store(anImage("1.2.3.2")).status, 200);
+    const Reply held = get("/studies/1.2/instances?SOPInstanceUID=1.2.3.2");
+    EXPECT_EQ(held.status, 503);
+    EXPECT_EQ(held.header("Retry-After"), "1");
+    EXPECT_EQ(get("/studies?StudyInstanceUID=1.2").status, 200) << "it is known";
+    claim.reset();
+    EXPECT_EQ(instances("1.2"), 2);
+}
+
 TEST_F(StoreTest, TellsOfEachPartWhatBecameOfIt)
 {
     start();

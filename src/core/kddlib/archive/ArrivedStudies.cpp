@@ -63,7 +63,7 @@ struct ArrivedStudies::Private
     PendingStudy& obtain(const QByteArray& studyUID);
     std::unique_ptr<PendingStudy> take(const QByteArray& studyUID);
     std::unique_ptr<PendingStudy> takeLocked(const QByteArray& studyUID);
-    Result finish(const QByteArray& studyUID, Kxg::Catalogue& catalogue, int patienceMs);
+    Attempt finish(const QByteArray& studyUID, Kxg::Catalogue& catalogue, int patienceMs);
     void conclude(const QByteArray& studyUID, bool isDone, Clock::duration time);
 
     Pace pace;
@@ -291,7 +291,8 @@ std::unique_ptr<PendingStudy> ArrivedStudies::Private::takeLocked(const QByteArr
     return study;
 }
 
-Result ArrivedStudies::Private::finish(const QByteArray& studyUID, Kxg::Catalogue& catalogue, int patienceMs)
+ArrivedStudies::Attempt ArrivedStudies::Private::finish(const QByteArray& studyUID, Kxg::Catalogue& catalogue,
+                                                        int patienceMs)
 {
     std::unique_ptr<Kxg::StudyClaim> claim;
     // Nothing has to be done for one that is gone.
@@ -300,14 +301,14 @@ Result ArrivedStudies::Private::finish(const QByteArray& studyUID, Kxg::Catalogu
     if (result.bad() || !known.contains(studyUID)) {
         if (result.good())
             take(studyUID);
-        return result;
+        return {result};
     }
     result = catalogue.claim(studyUID, patienceMs, claim);
     if (result.good() && claim == nullptr)
         result = Result::failure(QStringLiteral("Study %1 is being worked on by another process")
                                      .arg(QString::fromUtf8(studyUID)));
     if (result.bad())
-        return result;
+        return {result};
     StudyCompletion completion(catalogue);
     std::unique_ptr<PendingStudy> study;
     {
@@ -317,8 +318,9 @@ Result ArrivedStudies::Private::finish(const QByteArray& studyUID, Kxg::Catalogu
     }
     // Others may have done it, and it is not done again for nothing.
     if (result.bad() || study == nullptr || !completion.isChanged())
-        return result;
-    return completion.completeRead(*claim, study->file, study->requests).result;
+        return {result};
+    result = completion.completeRead(*claim, study->file, study->requests).result;
+    return {result, result.bad()};
 }
 
 void ArrivedStudies::Private::conclude(const QByteArray& studyUID, bool isDone, Clock::duration time)
@@ -341,7 +343,8 @@ void ArrivedStudies::Private::conclude(const QByteArray& studyUID, bool isDone, 
     changed.notify_all();
 }
 
-Result ArrivedStudies::complete(const QByteArray& studyUID, Kxg::Catalogue& catalogue, int patienceMs)
+ArrivedStudies::Attempt ArrivedStudies::complete(const QByteArray& studyUID, Kxg::Catalogue& catalogue,
+                                                 int patienceMs)
 {
     d->recordDigests(catalogue);
     {
@@ -349,16 +352,16 @@ Result ArrivedStudies::complete(const QByteArray& studyUID, Kxg::Catalogue& cata
         const bool isFree = d->changed.wait_for(lock, std::chrono::milliseconds(patienceMs),
                                                 [&] { return !d->running.contains(studyUID); });
         if (!isFree)
-            return Result::failure(
-                QStringLiteral("Study %1 is being completed").arg(QString::fromUtf8(studyUID)));
+            return {Result::failure(
+                QStringLiteral("Study %1 is being completed").arg(QString::fromUtf8(studyUID)))};
         if (d->pending.count(studyUID) == 0)
             return {};
         d->running.insert(studyUID);
     }
     const Clock::time_point began = Clock::now();
-    Result result = d->finish(studyUID, catalogue, patienceMs);
-    d->conclude(studyUID, result.good(), Clock::now() - began);
-    return result;
+    Attempt attempt = d->finish(studyUID, catalogue, patienceMs);
+    d->conclude(studyUID, attempt.result.good(), Clock::now() - began);
+    return attempt;
 }
 
 }  // namespace Kdd

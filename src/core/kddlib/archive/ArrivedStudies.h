@@ -61,10 +61,18 @@ public:
     /// Whatever waits in `awaitDue` returns from now on.
     void stop();
 
+    /// What became of an attempt to complete a study.
+    struct Attempt
+    {
+        Result result;
+        bool reachedFiles =
+            false;  ///< failed with the study's files: else others work on it, or the database failed
+    };
+
     /// Brings into the study's tag file what has arrived by now; nothing where nothing has. Waits up to `patienceMs` [ms]
     /// for another thread that does it, and as long for another process that works on the study. What fails is tried again
     /// later, a few times, and then left to whoever works the queue off.
-    Result complete(const QByteArray& studyUID, Kxg::Catalogue& catalogue, int patienceMs);
+    Attempt complete(const QByteArray& studyUID, Kxg::Catalogue& catalogue, int patienceMs);
 
     /// Whether something of the study is not in its tag file yet.
     bool isWaiting(const QByteArray& studyUID) const;

@@ -68,6 +68,11 @@ Removal failed(const Result& result)
     return {result.good() ? Removal::Fault::None : Removal::Fault::Failed, result, 0};
 }
 
+Removal unasked(const Result& result)
+{
+    return {Removal::Fault::Unasked, result, 0};
+}
+
 Result unchanged(const QByteArray& studyUID, const TagFile& file)
 {
     const QString what = QStringLiteral("Study %1 is not changed").arg(QString::fromUtf8(studyUID));
@@ -113,7 +118,7 @@ Removal StudyChange::remove(const ArchiveNode& node, int patienceMs)
     // One is enough: before all UIDs that it begins comes the UID itself.
     const Result found = mCatalogue.findStudies(node.study, 1, registered);
     if (found.bad())
-        return failed(found);
+        return unasked(found);
     return registered.contains(node.study) ? removeRegistered(node, patienceMs) : removeUnregistered(node);
 }
 
@@ -130,7 +135,7 @@ Removal StudyChange::removeRegistered(const ArchiveNode& node, int patienceMs)
     if (result.good())
         result = mCatalogue.studyContents(node.study, contents);
     if (result.bad())
-        return failed(result);
+        return unasked(result);
     // Others may have removed it while this waited for them.
     if (contents.id == 0)
         return removeUnregistered(node);
@@ -144,7 +149,7 @@ Removal StudyChange::removeRegistered(const ArchiveNode& node, int patienceMs)
     // The database first: whatever dies from here on leaves a study that waits to be completed.
     result = forget(node);
     if (result.bad())
-        return failed(result);
+        return unasked(result);
     StudyCompletion completion(mCatalogue);
     // What had changed before this removal is not in the tag file yet,
     // so taking images out of that would not do.

@@ -27,6 +27,7 @@ struct Removal
         None,
         Absent,     ///< there is no such node
         LockedOut,  ///< others work on the study all the time: try again
+        Unasked,    ///< the database failed, and nothing is removed: try again
         Failed,     ///< it is not removed whole; a repeat completes it
     };
 

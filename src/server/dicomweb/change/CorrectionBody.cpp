@@ -105,7 +105,7 @@ Http::Response CorrectionBody::correct()
     QSet<QByteArray> missing(mJob.images.cbegin(), mJob.images.cend());
     missing.intersect(QSet<QByteArray>(outcome.notFound.cbegin(), outcome.notFound.cend()));
     const bool hasImages = outcome.asked > missing.size();
-    if (!hasImages && arrived == Arrived::Waiting)
+    if (!hasImages && isLacking(arrived))
         return studyIsBusy();
     Http::Response response = Http::textResponse(hasImages ? 200 : 404, "application/json",
                                                  correctionReport(mJob, mOrder.root, mOrder.isPreview));
@@ -132,6 +132,8 @@ Http::Response CorrectionBody::failed(const Result& result) const
     }
     LogFile::errorf("Request %s: study %s is not corrected: %s", mOrder.id.constData(),
                     mJob.studyUID.constData(), qUtf8Printable(result.text()));
+    if (mJob.outcome.isUnasked)
+        return databaseIsAway();
     return Http::failure(500, QStringLiteral("The correction could not be made; the server's log tells why"));
 }
 

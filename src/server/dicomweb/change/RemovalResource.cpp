@@ -50,12 +50,15 @@ Http::Response RemovalResource::remove(const Http::Request& request, const Resou
     });
     if (asked.good())
         return removed(path.study, removal.images);
-    if (removal.result.good())
-        return databaseIsAway();
     if (removal.fault == Removal::Fault::Absent)
         return Http::failure(404, asked.text());
     if (removal.fault == Removal::Fault::LockedOut)
         return studyIsBusy();
+    if (removal.result.good() || removal.fault == Removal::Fault::Unasked) {
+        LogFile::errorf("Request %s: nothing is removed of study %s: %s", request.id.constData(),
+                        path.study.constData(), qUtf8Printable(asked.text()));
+        return databaseIsAway();
+    }
     LogFile::errorf("Request %s: nothing, or not all, is removed of study %s: %s", request.id.constData(),
                     path.study.constData(), qUtf8Printable(asked.text()));
     return Http::failure(500, QStringLiteral("It could not be removed whole; asking again goes on with it"));

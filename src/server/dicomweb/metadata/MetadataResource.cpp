@@ -72,7 +72,7 @@ Http::Response MetadataResource::answer(const Http::Request& request, const Reso
         response.status == 404 && arrivals != nullptr ? arrivals->bringIn(path.study) : Arrived::Nothing;
     if (arrived == Arrived::Brought)
         response = look(request, metadata);
-    return arrived == Arrived::Waiting ? notThere(Presence::Held) : std::move(response);
+    return isLacking(arrived) ? notThere(Presence::Held) : std::move(response);
 }
 
 Http::Response MetadataResource::look(const Http::Request& request, const MetadataRequest& metadata)

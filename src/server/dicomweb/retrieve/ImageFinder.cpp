@@ -28,7 +28,7 @@ Verdict findStudy(StudyShelf& shelf, const ResourcePath& path, std::shared_ptr<c
         const Arrived arrived = shelf.arrivals()->bringIn(path.study);
         if (arrived == Arrived::Brought)
             presence = shelf.find(path.study, study);
-        else if (arrived == Arrived::Waiting)
+        else if (isLacking(arrived))
             presence = Presence::Held;
     }
     switch (presence) {

@@ -45,6 +45,13 @@ Http::Response answerOf(const FoundAnswers& answers, const Http::MediaType& type
     return Http::textResponse(200, parts.mediaType(), body + parts.finish());
 }
 
+Http::Response studyIsWritten()
+{
+    Http::Response response = Http::failure(503, QStringLiteral("A study is being written; ask again"));
+    response.addHeader("Retry-After", "1");
+    return response;
+}
+
 }  // namespace
 
 bool SearchResource::owns(const ResourcePath& path) const
@@ -72,8 +79,10 @@ Http::Response SearchResource::answer(const Http::Request& request, const Resour
     if (mShelf.arrivals() != nullptr && path.study.isEmpty() &&
         (isBelowStudies || request.studies != nullptr))
         mShelf.arrivals()->bringInOwn({});
-    else if (isBelowStudies && mShelf.arrivals() != nullptr)
-        mShelf.arrivals()->bringIn(path.study);
+    else if (isBelowStudies && mShelf.arrivals() != nullptr &&
+             mShelf.arrivals()->bringIn(path.study) == Arrived::Held)
+        // What was told as stored would be missing.
+        return studyIsWritten();
 
     const QByteArray root = request.base;
     Http::Response response;
@@ -86,8 +95,7 @@ Http::Response SearchResource::answer(const Http::Request& request, const Resour
             return done;
         }
         if (run.isHeldUp()) {
-            response = Http::failure(503, QStringLiteral("A study is being written; ask again"));
-            response.addHeader("Retry-After", "1");
+            response = studyIsWritten();
             return done;
         }
         if (run.unread() > 0 && !search.study.isEmpty()) {

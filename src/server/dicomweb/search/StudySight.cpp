@@ -30,7 +30,7 @@ Sight StudySight::look(const Limits& limits, const QByteArray& studyUID) const
         arrived = mShelf.arrivals()->bringIn(studyUID);
     if (arrived == Arrived::Brought)
         result = find(limits, studyUID, found);
-    if (result.bad() || arrived == Arrived::Waiting)
+    if (result.bad() || isLacking(arrived))
         return Sight::Unknown;
     return found.empty() ? Sight::Hidden : Sight::Seen;
 }

@@ -97,28 +97,32 @@ void ArrivalService::work()
 Result ArrivalService::complete(const QByteArray& studyUID, int patienceMs)
 {
     return mDatabase.ask(
-        [&](Kxg::Catalogue& catalogue) { return mStudies.complete(studyUID, catalogue, patienceMs); });
+        [&](Kxg::Catalogue& catalogue) { return mStudies.complete(studyUID, catalogue, patienceMs).result; });
 }
 
 Arrived ArrivalService::bringIn(const QByteArray& studyUID)
 {
-    const QByteArray folder = mStore->rules().folder + '/' + studyUID;
-    // Asked in any case: another server may have taken it.
+    // Asked in any case: another server may have taken it. Others may wait too, of which some thousand files were registered
+    // that nobody waits for.
+    bool isAwaited = false;
     const Result result = mDatabase.ask([&](Kxg::Catalogue& catalogue) {
-        QVector<QByteArray> waiting;
-        QVector<qint64> arrived;
-        Result asked = catalogue.additions(studyUID, arrived);
-        // Others may wait too, of which some thousand files were registered that nobody waits for.
-        if (asked.good() && !arrived.isEmpty())
-            asked = catalogue.waitingStudies(folder, waiting);
-        if (waiting.contains(studyUID) && !mStudies.isWaiting(studyUID))
-            mStudies.addWaiting(studyUID);
-        return asked;
+        return catalogue.awaitsObjects(studyUID, mStore->rules().folder, isAwaited);
     });
-    if (result.good() && !mStudies.isWaiting(studyUID))
+    // Also where a thread completes the study now: it may have looked at what there was to do before this came.
+    if (isAwaited)
+        mStudies.addWaiting(studyUID);
+    if (result.bad())
+        return Arrived::Held;
+    if (!mStudies.isWaiting(studyUID))
         return Arrived::Nothing;
-    return result.good() && complete(studyUID, ExResource::readPatience()).good() ? Arrived::Brought
-                                                                                  : Arrived::Waiting;
+    ArrivedStudies::Attempt attempt;
+    const Result done = mDatabase.ask([&](Kxg::Catalogue& catalogue) {
+        attempt = mStudies.complete(studyUID, catalogue, ExResource::readPatience());
+        return attempt.result;
+    });
+    if (done.good())
+        return Arrived::Brought;
+    return attempt.reachedFiles ? Arrived::Stuck : Arrived::Held;
 }
 
 void ArrivalService::bringInOwn(const QByteArray& studyUID)

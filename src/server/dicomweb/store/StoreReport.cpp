@@ -110,6 +110,7 @@ void StoreReport::add(const ArrivedObject& object)
     addText(entry, kSopInstance, "UI", object.sopInstanceUID);
     if (!object.isStored()) {
         mIsOutOfSpace = mIsOutOfSpace || object.fault == ArrivalFault::OutOfSpace;
+        mMayComeAgain = mMayComeAgain || mIsOutOfSpace || object.fault == ArrivalFault::Failed;
         entry.insert(kFailureReason, element("US", {failureReason(object.fault)}));
         (isNamed ? mFailed : mOthers).append(entry);
         return;
@@ -128,7 +129,7 @@ int StoreReport::status(int badStatus) const
         return failed() > 0 || badStatus != 0 ? 202 : 200;
     if (badStatus != 0)
         return badStatus;
-    return mIsOutOfSpace ? 503 : 409;
+    return mMayComeAgain ? 503 : 409;
 }
 
 Http::Response StoreReport::response(Form form, int badStatus) const
@@ -149,7 +150,7 @@ Http::Response StoreReport::response(Form form, int badStatus) const
                                   : Http::textResponse(code, "application/dicom+json",
                                                        QJsonDocument(report).toJson(QJsonDocument::Compact));
     if (code == 503)
-        response.addHeader("Retry-After", "60");
+        response.addHeader("Retry-After", mIsOutOfSpace ? "60" : "10");
     return response;
 }
 

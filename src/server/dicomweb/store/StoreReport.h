@@ -27,7 +27,7 @@ public:
 
     enum class Form { Json, Xml };
 
-    /// 200: all are stored; 202: some; 409: none; 503: none, for want of room. `badStatus`, not 0, is that of a request that
+    /// 200: all are stored; 202: some; 409: none; 503: none, for want of room or because database or disk failed. `badStatus`, not 0, is that of a request that
     /// broke off, where nothing was stored.
     Http::Response response(Form form, int badStatus) const;
 
@@ -39,6 +39,7 @@ private:
     QByteArray mOneStudy;  // of all that are stored, as long as it is one
     bool mAreOfOneStudy = true;
     bool mIsOutOfSpace = false;
+    bool mMayComeAgain = false;  // with one at least nothing is wrong
     QJsonArray mStored;
     QJsonArray mFailed;
     QJsonArray mOthers;  // of which it is not known what they are

@@ -133,6 +133,7 @@ Result QAJob::open()
 {
     Result result = mIsPreview ? mRecord.consult(mJob) : mRecord.claim(mJob);
     mJob.outcome.isLockedOut = mRecord.wasLockedOut();
+    mJob.outcome.isUnasked = mRecord.wasUnasked();
     if (result.good() && !mIsPreview)
         return hold();
     if (result.good())
@@ -213,6 +214,7 @@ void QAJob::tidy()
 Result QAJob::recorded(const Result& result)
 {
     mJob.outcome.isLockedOut = mRecord.wasLockedOut();
+    mJob.outcome.isUnasked = mRecord.wasUnasked();
     mJob.outcome.refusedImage = mRecord.refusedImage();
     mJob.outcome.isRefused = !mRecord.refusedImage().isEmpty();
     return result;

@@ -85,7 +85,7 @@ Result QARecord::open(const QAData& job, QList<QByteArray>& uids, QVector<QByteA
             known.append(uid);
     }
     if (result.bad())
-        return result.within(QString::fromLatin1(kNotKept));
+        return asked(result).within(QString::fromLatin1(kNotKept));
     // Images that no database lists are not built again either, so there is nobody to be told.
     if (!known.isEmpty())
         mCatalogue = std::move(catalogue);
@@ -130,6 +130,13 @@ Result QARecord::lockedOut(const QString& reason)
     return Result::failure(reason);
 }
 
+/// What the database said.
+Result QARecord::asked(const Result& result)
+{
+    mIsUnasked = mIsUnasked || result.bad();
+    return result;
+}
+
 /// The destination is made when it is not there. Another study may have lost its last image and be gone meanwhile.
 Result QARecord::claimOne(const QByteArray& studyUID, bool isDestination)
 {
@@ -142,7 +149,7 @@ Result QARecord::claimOne(const QByteArray& studyUID, bool isDestination)
     if (result.bad() && mCatalogue->findStudies(studyUID, 1, found).good() && !found.contains(studyUID))
         return {};
     if (result.bad())
-        return result.within(QStringLiteral("Study %1 cannot be claimed").arg(study));
+        return asked(result).within(QStringLiteral("Study %1 cannot be claimed").arg(study));
     if (claim == nullptr)
         return lockedOut(QStringLiteral("Study %1 is being worked on by another process").arg(study));
     Study& claimed = mStudies[studyUID];
@@ -231,7 +238,7 @@ bool QARecord::identifyByLog(const QAImageChange& change, Kxg::ImageCorrection& 
     const ImageIdentity identity =
         identityBefore(change.before, {change.studyUID, change.key}, filePathOf(*image));
     std::vector<Kxg::ImageCorrection> known;
-    if (mCatalogue->corrections(identity.studyUID, known).bad())
+    if (asked(mCatalogue->corrections(identity.studyUID, known)).bad())
         return false;
     for (const Kxg::ImageCorrection& each : known) {
         if (ImageIdentity{each.studyInstanceUID, each.image} == identity)
@@ -247,7 +254,7 @@ Result QARecord::plan()
 {
     if (mCatalogue == nullptr)
         return {};
-    Result result = read();
+    Result result = asked(read());
     for (const QAImageChange& change : mChanges) {
         Kxg::ImageCorrection former;
         if (result.bad())
@@ -258,7 +265,13 @@ Result QARecord::plan()
         if (change.wasThereAlready &&
             findShown(change.holder->studyInstanceUID(), change.keyNow, change.before) != nullptr)
             continue;
-        if (!identify(change, former)) {
+        const bool isKnown = identify(change, former);
+        if (!isKnown && mIsUnasked) {
+            result =
+                Result::failure(QStringLiteral("the image database does not tell of earlier corrections"));
+            break;
+        }
+        if (!isKnown) {
             const QString reason =
                 QStringLiteral("Image %1: study %2 is to be built first, for its tag file does not "
                                "show an earlier correction yet")
@@ -282,7 +295,8 @@ Result QARecord::record()
 {
     Result result = plan();
     if (result.good() && !mRecorded.empty())
-        result = mCatalogue->recordCorrections(mRecorded, mRequests).within(QString::fromLatin1(kNotKept));
+        result =
+            asked(mCatalogue->recordCorrections(mRecorded, mRequests)).within(QString::fromLatin1(kNotKept));
     return result;
 }
 

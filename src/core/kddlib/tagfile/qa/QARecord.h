@@ -65,6 +65,9 @@ public:
     /// Whether `claim` or `record` failed because others only have to finish what they do: then try again.
     bool wasLockedOut() const { return mIsLockedOut; }
 
+    /// Whether one of them failed because the database could not be asked or written.
+    bool wasUnasked() const { return mIsUnasked; }
+
     /// Makes what `record` did undone. On failure what was recorded stays.
     Result takeBack();
 
@@ -85,6 +88,7 @@ private:
     Result open(const QAData& job, QList<QByteArray>& uids, QVector<QByteArray>& known);
     Result claimOne(const QByteArray& studyUID, bool isDestination);
     Result lockedOut(const QString& reason);
+    Result asked(const Result& result);
     Result read();
     bool identify(const QAImageChange& change, Kxg::ImageCorrection& former);
     bool identifyByLog(const QAImageChange& change, Kxg::ImageCorrection& former);
@@ -104,6 +108,7 @@ private:
     bool mIsClaimed = false;
     bool mIsFinal = false;  // taking it back would do more than that
     bool mIsLockedOut = false;
+    bool mIsUnasked = false;
 };
 
 }  // namespace Kdd
