@@ -1,5 +1,6 @@
 """A site as docs/deployment.md describes it, in a folder of its own: PostgreSQL, two servers, two workers, and nginx in front
 of the servers with the very configuration that the page shows."""
+import datetime
 import glob
 import os
 import re
@@ -12,8 +13,10 @@ import threading
 # Refuses to run as an administrator, and goes with us.
 POSTGRES = """set -- /usr/lib/postgresql/*/bin
 if [ $(id -u) = 0 ]; then chown nobody . && S="--reuid nobody --regid nogroup --clear-groups"; fi
-setpriv --pdeathsig QUIT $S $1/initdb -D data -U kdd -A trust -E UTF8 --no-sync --locale=C.UTF-8 >initdb.log &&
+[ -d data ] || setpriv --pdeathsig QUIT $S $1/initdb -D data -U kdd -A trust -E UTF8 --no-sync --locale=C.UTF-8 >initdb.log &&
 exec setpriv --pdeathsig QUIT $S $1/postgres -D data -k $PWD -c listen_addresses= -c max_connections=300 -c fsync=off"""
+
+ANSWERS = 8  # [MiB], of the folder of kept answers
 
 
 def free_port():
@@ -47,10 +50,20 @@ class DeployedSite:
         self.log = open(os.path.join(folder, "log"), "ab")
         self.environment = dict(
             os.environ, KDD_STORE=self.store, KDD_FREE_SPACE="0", KDD_SETTLE_SECONDS="3",
-            KDD_SERVER_PROXIES="127.0.0.1", KDD_DATABASE="postgresql://kdd@/postgres?host=" + self.database_folder())
+            KDD_SERVER_PROXIES="127.0.0.1", KDD_FILE_DIGESTS="1", KDD_CHECK_RATE="4", KDD_CHECK_HOURS="0",
+            KDD_ANSWERS_SIZE=str(ANSWERS), KDD_DATABASE="postgresql://kdd@/postgres?host=" + self.database_folder())
+        self.database_is_there = threading.Event()
+        os.makedirs(self.database_folder())
+        os.chmod(self.folder, 0o755)
         self.start_database()
         self.run("build")
         self.start_nginx(page)
+
+    def note(self, text):
+        """In the log of all programs, beside what they tell."""
+        now = datetime.datetime.now().isoformat(" ", "milliseconds")
+        self.log.write(f"{now} soak {text}\n".encode())
+        self.log.flush()
 
     def database_folder(self):
         return os.path.join(self.folder, "pg")
@@ -64,10 +77,7 @@ class DeployedSite:
         return done.stdout
 
     def start_database(self):
-        folder = self.database_folder()
-        os.makedirs(folder)
-        os.chmod(self.folder, 0o755)
-        server = subprocess.Popen(["sh", "-c", POSTGRES], cwd=folder, stdout=subprocess.PIPE, stderr=subprocess.STDOUT)
+        server = subprocess.Popen(["sh", "-c", POSTGRES], cwd=self.database_folder(), stdout=subprocess.PIPE, stderr=subprocess.STDOUT)
         self.processes["postgres"] = server
         said = b""
         while b"ready to accept connections" not in said:
@@ -75,6 +85,7 @@ class DeployedSite:
             if not line:
                 raise SystemExit("PostgreSQL did not start: " + said.decode())
             said += line
+        self.database_is_there.set()
         threading.Thread(target=lambda: [None for _ in server.stdout], daemon=True).start()
 
     def start_nginx(self, page):
@@ -100,7 +111,7 @@ class DeployedSite:
 
     def start_server(self, number):
         server = subprocess.Popen(
-            [self.kdd, "serve", "--stow", "--listen", f"127.0.0.1:{self.ports[number]}"], env=self.environment,
+            [self.kdd, "serve", "--stow", "--corrections", "--deletions", "--listen", f"127.0.0.1:{self.ports[number]}"], env=self.environment,
             stdout=subprocess.PIPE, stderr=self.log)
         if not server.stdout.readline():
             raise SystemExit(f"Server {number} did not start; see {self.log.name}")
@@ -111,14 +122,22 @@ class DeployedSite:
             [self.kdd, "build", "--forever"], env=self.environment, stdout=self.log, stderr=self.log)
 
     def start(self, name):
-        kind, number = name[:-1], int(name[-1])
-        (self.start_server if kind == "server" else self.start_worker)(number)
+        if name == "postgres":
+            self.start_database()
+        elif name.startswith("server"):
+            self.start_server(int(name[-1]))
+        else:
+            self.start_worker(int(name[-1]))
 
     def signalled(self, name, how, clients):
-        """False when it is a server and clients count on it."""
+        """False when clients count on it."""
         with clients.mutex:
-            if name.startswith("server") and clients.repeating > 0:
+            if not name.startswith("worker") and clients.repeating > 0:
                 return False
+            if name == "postgres":
+                self.database_is_there.clear()
+                # Killed alone it would leave those that work for it.
+                how = signal.SIGQUIT if how == signal.SIGKILL else signal.SIGINT
             self.processes[name].send_signal(how)
             return True
 
@@ -128,6 +147,9 @@ class DeployedSite:
         if how is not None:
             process.send_signal(how)
         return process.wait(120)
+
+    def files(self, folder):
+        return [os.path.join(root, name) for root, _, names in os.walk(os.path.join(self.store, folder)) for name in names]
 
     def tag_files(self, store=None):
         """Their bytes, by their place."""
