@@ -232,9 +232,12 @@ class Archive:
         wanted, content, is_whole = self.listed_images(study), {}, True
         for key, (path, known) in wanted.items():
             file = self.disk.get(path)
-            # Of a file that was registered without UID nothing is known that it could contradict.
-            if file and file.study == known.study and (not known.sop or file[:3] == known[:3]):
-                content[key_of(path, file)] = Image(path, self.corrected(path, file))
+            # What was registered without UID has none that it could contradict.
+            if file and file[:2] == known[:2] and known.sop in ("", file.sop):
+                # Two that were registered as others may be one image by now.
+                there = content.get(key_of(path, file))
+                if there is None or self.registered[there.path].order < self.registered[path].order:
+                    content[key_of(path, file)] = Image(path, self.corrected(path, file))
                 continue
             is_whole = False
             if key in self.shown.get(study, {}):

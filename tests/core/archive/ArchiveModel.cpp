@@ -218,7 +218,11 @@ bool ArchiveModel::build(const std::string& study)
                             (known.sop.empty() || file->second.sop == known.sop);
         if (isThat) {
             const std::string key = keyOf(path, file->second);
-            content[key] = {path, edited(key, file->second)};
+            // Two that were registered as others may be one image by now.
+            const auto there = content.find(key);
+            if (there == content.end() ||
+                mRegistered.at(there->second.path).number < mRegistered.at(path).number)
+                content[key] = {path, edited(key, file->second)};
             continue;
         }
         isWhole = false;
