@@ -277,10 +277,6 @@ public:
     /// The requests of a study that were left because files came that were not known before, and for nothing else.
     virtual Kdd::Result additions(const QByteArray& studyUID, QVector<qint64>& requests) = 0;
 
-    /// Whether the study has changes that its tag file does not show, has files below the folder, and nobody has tried in vain
-    /// to build it since: a file could not be read.
-    virtual Kdd::Result awaitsObjects(const QByteArray& studyUID, const QByteArray& folder, bool& awaits) = 0;
-
     /// Takes out of `paths` what is known, and what was removed and not registered again.
     virtual Kdd::Result dropKnown(QSet<QByteArray>& paths) = 0;
 
@@ -318,6 +314,10 @@ public:
 
     /// The stamps of those of the paths that are known.
     virtual Kdd::Result stampsOf(const QList<QByteArray>& paths, QHash<QByteArray, FileStamp>& stamps) = 0;
+
+    /// Whether the study has changes that its tag file does not show, has files below the folder, and nobody has tried in vain
+    /// to build it since: a file could not be read.
+    virtual Kdd::Result awaitsObjects(const QByteArray& studyUID, const QByteArray& folder, bool& awaits) = 0;
 
 protected:
     Catalogue() = default;

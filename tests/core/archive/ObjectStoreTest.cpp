@@ -104,7 +104,7 @@ TEST_F(ObjectStoreTest, LeavesAStudyThatWaitsAndCompletesIt)
     QByteArray due;
     ASSERT_TRUE(studies.awaitDue(due));
     EXPECT_EQ(due, "1.2");
-    ASSERT_TRUE(studies.complete(due, *database, 0).result.good());
+    ASSERT_TRUE(studies.complete(due, *database, 0).good());
     EXPECT_FALSE(studies.isWaiting("1.2"));
     EXPECT_EQ(waiting(), "");
     TagFile file;
@@ -120,12 +120,12 @@ TEST_F(ObjectStoreTest, MergesArrivalsWithoutOpeningTheirFilesAgain)
     const auto database = catalogue();
     const auto objects = open(studies);
     store(*objects, *database, anImage("1.2.3.1"));
-    ASSERT_TRUE(studies.complete("1.2", *database, 0).result.good());
+    ASSERT_TRUE(studies.complete("1.2", *database, 0).good());
     store(*objects, *database, anImage("1.2.3.2"));
     store(*objects, *database, anImage("1.2.3.3"));
     // A build would miss them.
     QDir(mFolder.filePath("objects/1.2")).removeRecursively();
-    ASSERT_TRUE(studies.complete("1.2", *database, 0).result.good());
+    ASSERT_TRUE(studies.complete("1.2", *database, 0).good());
     TagFile file;
     ASSERT_TRUE(file.readCacheFileForStudy("1.2", false));
     EXPECT_EQ(file.imagesByUID().size(), 3);
@@ -140,11 +140,11 @@ TEST_F(ObjectStoreTest, MergesWhatAnotherServerTookAlongAndThatOneHasNothingLeft
     const auto objectsOfOther = open(other);
     for (const char* uid : {"1.2.3.1", "1.2.3.2", "1.2.3.3"})
         store(*objectsOfOne, *database, anImage(uid));
-    ASSERT_TRUE(one.complete("1.2", *database, 0).result.good());
+    ASSERT_TRUE(one.complete("1.2", *database, 0).good());
     // A build would not be whole any more.
     QFile::remove(mFolder.filePath("objects/1.2/1.2.3/1.2.3.1.dcm"));
     const auto expectHeld = [&](ArrivedStudies& by, int images) {
-        EXPECT_TRUE(by.complete("1.2", *database, 0).result.good());
+        EXPECT_TRUE(by.complete("1.2", *database, 0).good());
         TagFile file;
         ASSERT_TRUE(file.readCacheFileForStudy("1.2", false));
         EXPECT_EQ(file.imagesByUID().size(), images);
@@ -195,10 +195,10 @@ TEST_F(ObjectStoreTest, LeavesAloneWhatAnotherProcessCompletes)
         const auto other = catalogue();
         std::unique_ptr<Kxg::StudyClaim> claim;
         ASSERT_TRUE(other->claim("1.2", 0, claim).good());
-        EXPECT_TRUE(studies.complete("1.2", *database, 10).result.bad());
+        EXPECT_TRUE(studies.complete("1.2", *database, 10).bad());
         EXPECT_TRUE(studies.isWaiting("1.2"));
     }
-    EXPECT_TRUE(studies.complete("1.2", *database, 0).result.good());
+    EXPECT_TRUE(studies.complete("1.2", *database, 0).good());
     EXPECT_FALSE(studies.isWaiting("1.2"));
 }
 

@@ -343,8 +343,8 @@ void ArrivedStudies::Private::conclude(const QByteArray& studyUID, bool isDone, 
     changed.notify_all();
 }
 
-ArrivedStudies::Attempt ArrivedStudies::complete(const QByteArray& studyUID, Kxg::Catalogue& catalogue,
-                                                 int patienceMs)
+ArrivedStudies::Attempt ArrivedStudies::attempt(const QByteArray& studyUID, Kxg::Catalogue& catalogue,
+                                                int patienceMs)
 {
     d->recordDigests(catalogue);
     {
@@ -362,6 +362,11 @@ ArrivedStudies::Attempt ArrivedStudies::complete(const QByteArray& studyUID, Kxg
     Attempt attempt = d->finish(studyUID, catalogue, patienceMs);
     d->conclude(studyUID, attempt.result.good(), Clock::now() - began);
     return attempt;
+}
+
+Result ArrivedStudies::complete(const QByteArray& studyUID, Kxg::Catalogue& catalogue, int patienceMs)
+{
+    return attempt(studyUID, catalogue, patienceMs).result;
 }
 
 }  // namespace Kdd

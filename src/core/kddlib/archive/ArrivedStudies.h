@@ -72,7 +72,10 @@ public:
     /// Brings into the study's tag file what has arrived by now; nothing where nothing has. Waits up to `patienceMs` [ms]
     /// for another thread that does it, and as long for another process that works on the study. What fails is tried again
     /// later, a few times, and then left to whoever works the queue off.
-    Attempt complete(const QByteArray& studyUID, Kxg::Catalogue& catalogue, int patienceMs);
+    Attempt attempt(const QByteArray& studyUID, Kxg::Catalogue& catalogue, int patienceMs);
+
+    /// The same for whoever need not know why it failed.
+    Result complete(const QByteArray& studyUID, Kxg::Catalogue& catalogue, int patienceMs);
 
     /// Whether something of the study is not in its tag file yet.
     bool isWaiting(const QByteArray& studyUID) const;

@@ -27,8 +27,8 @@ struct Removal
         None,
         Absent,     ///< there is no such node
         LockedOut,  ///< others work on the study all the time: try again
-        Unasked,    ///< the database failed, and nothing is removed: try again
         Failed,     ///< it is not removed whole; a repeat completes it
+        Unasked,    ///< the database failed, and nothing is removed: try again
     };
 
     Fault fault = Fault::None;

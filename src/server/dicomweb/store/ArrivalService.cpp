@@ -97,7 +97,7 @@ void ArrivalService::work()
 Result ArrivalService::complete(const QByteArray& studyUID, int patienceMs)
 {
     return mDatabase.ask(
-        [&](Kxg::Catalogue& catalogue) { return mStudies.complete(studyUID, catalogue, patienceMs).result; });
+        [&](Kxg::Catalogue& catalogue) { return mStudies.complete(studyUID, catalogue, patienceMs); });
 }
 
 Arrived ArrivalService::bringIn(const QByteArray& studyUID)
@@ -117,7 +117,7 @@ Arrived ArrivalService::bringIn(const QByteArray& studyUID)
         return Arrived::Nothing;
     ArrivedStudies::Attempt attempt;
     const Result done = mDatabase.ask([&](Kxg::Catalogue& catalogue) {
-        attempt = mStudies.complete(studyUID, catalogue, ExResource::readPatience());
+        attempt = mStudies.attempt(studyUID, catalogue, ExResource::readPatience());
         return attempt.result;
     });
     if (done.good())

@@ -56,9 +56,8 @@ struct KDD_EXPORT QAData
         QVector<QAImageOutcome> images;  ///< those that are changed
         bool isLockedOut = false;        ///< it failed because others held a study all the time: try again
         bool isRefused = false;   ///< it failed because of what it asks of these images: it would again
+        bool isUnasked = false;   ///< it failed because the image database did; nothing is changed: try again
         QByteArray refusedImage;  ///< the image that the reason names; empty: none
-        bool isUnasked =
-            false;  ///< it failed because the image database did, and nothing is changed: try again
     };
 
     Outcome outcome;
