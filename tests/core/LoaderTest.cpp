@@ -45,8 +45,7 @@ protected:
 
     void save(const DatasetBuilder& image, const char* name) const
     {
-        DcmFileFormat format(&image.dataset());
-        ASSERT_TRUE(format.saveFile(path(name).constData(), EXS_LittleEndianExplicit).good());
+        image.save(QFile::decodeName(path(name)));
     }
 
     int sizeOf(const char* name) const

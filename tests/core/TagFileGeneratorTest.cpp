@@ -26,27 +26,17 @@ protected:
     /// A square image whose right half is bright.
     static DatasetBuilder aPicture(const char* sopUID, const char* number)
     {
-        DatasetBuilder image = anImage(sopUID);
-        const std::pair<DcmTagKey, Uint16> words[] = {
-            {DCM_SamplesPerPixel, 1}, {DCM_Rows, kSize}, {DCM_Columns, kSize},         {DCM_BitsAllocated, 8},
-            {DCM_BitsStored, 8},      {DCM_HighBit, 7},  {DCM_PixelRepresentation, 0},
-        };
-        for (const auto& word : words)
-            image.dataset().putAndInsertUint16(word.first, word.second);
-        const QByteArray pixels = halfBright();
-        image.dataset().putAndInsertUint8Array(DCM_PixelData,
-                                               reinterpret_cast<const Uint8*>(pixels.constData()),
-                                               static_cast<unsigned long>(pixels.size()));
-        return image.with(DCM_SOPClassUID, UID_CTImageStorage)
-            .with(DCM_PhotometricInterpretation, "MONOCHROME2")
+        return anImage(sopUID)
+            .asPicture(kSize, kSize, 8)
+            .data(DCM_PixelData, halfBright())
+            .with(DCM_SOPClassUID, UID_CTImageStorage)
             .with(DCM_InstanceNumber, number);
     }
 
     /// Writes the file and has it registered, as part of the study that its dataset names or of another.
     void addFile(const DatasetBuilder& image, const QByteArray& name, const QByteArray& studyUID = "1.2")
     {
-        DcmFileFormat file(&image.dataset());
-        ASSERT_TRUE(file.saveFile(path(name).constData(), EXS_LittleEndianExplicit).good());
+        image.save(QFile::decodeName(path(name)));
         Kxg::DicomFileRecord record;
         record.path = path(name);
         record.studyInstanceUID = studyUID;
@@ -132,7 +122,7 @@ TEST_F(GeneratorTest, PartsKeepTheirNumbersAndNamesThroughASync)
 {
     for (int part = 1; part <= 12; ++part) {
         const QByteArray number = QByteArray::number(part);
-        addFile(anImage(number.constData()), number);
+        addFile(anImage(number), number);
         if (part != 5)
             addVolume("1.2.3-volume" + (part > 1 ? "_part" + number : QByteArray()) + ".vol",
                       {number.toStdString()});
@@ -244,7 +234,7 @@ TEST_F(GeneratorTest, WhatIsLoadedAlreadyMakesTheSameFile)
         EXPECT_TRUE(mCatalogue->listStudies(list).good());
         TagFile built;
         EXPECT_TRUE(TagFileGenerator().createTagFile(built, list.front().id, study.constData(), loaded));
-        QFile file(TagFile::cacheFilePathForStudy(study.constData()));
+        QFile file(TagFile::cacheFilePathForStudy(study));
         EXPECT_TRUE(file.open(QIODevice::ReadOnly));
         return file.readAll();
     };

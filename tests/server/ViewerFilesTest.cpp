@@ -1,12 +1,10 @@
 #include "server/ViewerFiles.h"
 
 #include "server/http/RequestTarget.h"
+#include "support/FileContent.h"
 
-#include <QDir>
-#include <QFile>
 #include <QTemporaryDir>
 
-#include <gtest/gtest.h>
 #include <unistd.h>
 
 using namespace Kdd;
@@ -36,12 +34,7 @@ protected:
 
     QString path(const char* name) const { return mFolder.filePath(QString::fromLatin1(name)); }
 
-    void write(const char* name, const QByteArray& content) const
-    {
-        QDir().mkpath(QFileInfo(path(name)).path());
-        QFile file(path(name));
-        EXPECT_TRUE(file.open(QIODevice::WriteOnly) && file.write(content) == content.size());
-    }
+    void write(const char* name, const QByteArray& content) const { putFile(path(name), content); }
 
     void link(const char* to, const char* name) const
     {

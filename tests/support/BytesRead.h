@@ -13,4 +13,12 @@ inline qint64 bytesRead()
                                           : -1;
 }
 
+/// Resident memory of a process, or of this one [KiB].
+inline qint64 residentMemory(const QString& process = QStringLiteral("self"))
+{
+    QFile file(QStringLiteral("/proc/%1/status").arg(process));
+    const QByteArray text = file.open(QIODevice::ReadOnly) ? file.readAll() : QByteArray();
+    return text.mid(text.indexOf("VmRSS:") + 6).trimmed().split(' ').first().toLongLong();
+}
+
 }  // namespace Kdd

@@ -1,6 +1,9 @@
 #include "support/DatasetBuilder.h"
 
 #include "kddlib/tagmodel/TagMap.h"
+#include "support/FileContent.h"
+
+#include <QFile>
 
 #include <dcmtk/dcmdata/dcpixseq.h>
 #include <dcmtk/dcmdata/dcpxitem.h>
@@ -68,6 +71,28 @@ DatasetBuilder& DatasetBuilder::fragments(E_TransferSyntax xfer, const std::vect
     return with(pixels);
 }
 
+DatasetBuilder& DatasetBuilder::data(const DcmTag& tag, const QByteArray& values)
+{
+    // Only pixel data of its own class is compressed.
+    auto* element = tag == DCM_PixelData ? new DcmPixelData(tag) : new DcmOtherByteOtherWord(tag);
+    element->putUint8Array(reinterpret_cast<const Uint8*>(values.constData()),
+                           static_cast<unsigned long>(values.size()));
+    return with(element);
+}
+
+DatasetBuilder& DatasetBuilder::asPicture(int rows, int columns, int bitsAllocated, const char* photometric)
+{
+    const bool isColour = QByteArray("YBR RGB").contains(QByteArray(photometric).left(3));
+    return with(DCM_Rows, QByteArray::number(rows))
+        .with(DCM_Columns, QByteArray::number(columns))
+        .with(DCM_BitsAllocated, QByteArray::number(bitsAllocated))
+        .with(DCM_BitsStored, QByteArray::number(bitsAllocated))
+        .with(DCM_HighBit, QByteArray::number(bitsAllocated - 1))
+        .with(DCM_SamplesPerPixel, isColour ? "3" : "1")
+        .with(DCM_PixelRepresentation, "0")
+        .with(DCM_PhotometricInterpretation, photometric);
+}
+
 DatasetBuilder& DatasetBuilder::with(DcmElement* element)
 {
     if (mDataset->insert(element, OFTrue).bad())
@@ -88,6 +113,21 @@ DatasetBuilder& DatasetBuilder::without(const DcmTagKey& key)
     return *this;
 }
 
+void DatasetBuilder::save(const QString& path, E_TransferSyntax syntax, E_EncodingType lengths) const
+{
+    DcmFileFormat file(mDataset.get());
+    if (file.saveFile(QFile::encodeName(path).constData(), syntax, lengths).bad())
+        throw std::invalid_argument("the test's image cannot be written");
+}
+
+QByteArray DatasetBuilder::file(E_TransferSyntax syntax) const
+{
+    const QTemporaryDir folder;
+    const QString path = folder.filePath(QStringLiteral("image.dcm"));
+    save(path, syntax);
+    return fileContent(path);
+}
+
 TagMap* DatasetBuilder::map(unsigned int maxLength) const
 {
     return TagMap::createTagMap(mDataset.get(), maxLength);
@@ -100,14 +140,22 @@ DatasetBuilder anImage(const char* sopUID)
 
 DatasetBuilder aPicture(int rows, int columns, int bitsAllocated, const char* photometric)
 {
-    const bool isColour = QByteArray("YBR RGB").contains(QByteArray(photometric).left(3));
-    return anItem()
-        .with(DCM_Rows, QByteArray::number(rows))
-        .with(DCM_Columns, QByteArray::number(columns))
-        .with(DCM_BitsAllocated, QByteArray::number(bitsAllocated))
-        .with(DCM_SamplesPerPixel, isColour ? "3" : "1")
-        .with(DCM_PixelRepresentation, "0")
-        .with(DCM_PhotometricInterpretation, photometric);
+    DatasetBuilder picture = anItem();
+    return picture.asPicture(rows, columns, bitsAllocated, photometric)
+        .without(DCM_BitsStored)
+        .without(DCM_HighBit);
+}
+
+DatasetBuilder aSlice(const char* sopUID, int number, double z, double y, double x)
+{
+    const QByteArray position = QString::asprintf("%g\\%g\\%g", x, y, z).toLatin1();
+    return anImage(sopUID)
+        .asPicture(3, 4, 16)
+        .with(DCM_InstanceNumber, QByteArray::number(number))
+        .with(DCM_ImagePositionPatient, position)
+        .with(DCM_ImageOrientationPatient, "1\\0\\0\\0\\1\\0")
+        .with(DCM_PixelSpacing, "0.25\\0.5")
+        .words({0, 1, 2, 3, 1000, 2000, 3000, 4000, 4095, 5, 6, 7});
 }
 
 DatasetBuilder anItem()

@@ -1,6 +1,6 @@
 #pragma once
 
-#include <QByteArray>
+#include <QString>
 
 #include <dcmtk/config/osconfig.h>
 
@@ -38,6 +38,13 @@ public:
     /// Compressed pixels in fragments of so many bytes, the first of which is the table of offsets.
     DatasetBuilder& fragments(E_TransferSyntax xfer, const std::vector<int>& sizes);
 
+    /// Binary values of any VR.
+    DatasetBuilder& data(const DcmTag& tag, const QByteArray& values);
+
+    /// What describes pixels, as `aPicture` has it, and how many bits are stored.
+    DatasetBuilder& asPicture(int rows, int columns, int bitsAllocated,
+                              const char* photometric = "MONOCHROME2");
+
     /// Takes the element over.
     DatasetBuilder& with(DcmElement* element);
 
@@ -48,6 +55,13 @@ public:
 
     const DcmDataset& build() const { return *mDataset; }
     DcmDataset& dataset() const { return *mDataset; }
+
+    /// Writes a DICOM file. What cannot be written throws.
+    void save(const QString& path, E_TransferSyntax syntax = EXS_LittleEndianExplicit,
+              E_EncodingType lengths = EET_UndefinedLength) const;
+
+    /// The bytes of such a file.
+    QByteArray file(E_TransferSyntax syntax = EXS_LittleEndianExplicit) const;
 
     /// What the cache makes of it; the caller owns the map.
     TagMap* map(unsigned int maxLength = 1024) const;
@@ -64,6 +78,9 @@ DatasetBuilder anImage(const char* sopUID = "1.2.3.1");
 /// A few pixels without identity: unsigned, with all bits stored unless a test says otherwise; of three samples when they
 /// are YBR or RGB.
 DatasetBuilder aPicture(int rows, int columns, int bitsAllocated, const char* photometric = "MONOCHROME2");
+
+/// An axial image of 4 x 3 pixels of 16 bits, half a millimetre wide and 0.25 mm high, at (x, y, z) [mm].
+DatasetBuilder aSlice(const char* sopUID, int number, double z, double y = 0, double x = 0);
 
 /// Without any attribute, for sequences.
 DatasetBuilder anItem();

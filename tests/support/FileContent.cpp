@@ -5,7 +5,10 @@
 #include <QFileInfo>
 #include <QtEndian>
 
+#include <fcntl.h>
 #include <libdeflate.h>
+#include <sys/stat.h>
+#include <unistd.h>
 
 namespace Kdd
 {
@@ -22,6 +25,22 @@ QByteArray fileContent(const QString& path)
 {
     QFile file(path);
     return file.open(QIODevice::ReadOnly) ? file.readAll() : QByteArray("(no file)");
+}
+
+void flipBit(const QString& path, qint64 byte, Clock clock)
+{
+    const int file = ::open(path.toUtf8().constData(), O_RDWR | O_CLOEXEC);
+    struct stat status = {};
+    char bits = 0;
+    ASSERT_EQ(::fstat(file, &status), 0) << path.toStdString();
+    ASSERT_EQ(::pread(file, &bits, 1, byte), 1);
+    bits = static_cast<char>(bits ^ (1 << (byte % 8)));
+    ASSERT_EQ(::pwrite(file, &bits, 1, byte), 1);
+    const timespec times[2] = {status.st_atim, status.st_mtim};
+    if (clock == Clock::Kept) {
+        ASSERT_EQ(::futimens(file, times), 0);
+    }
+    ::close(file);
 }
 
 QByteArray journalOf(const QByteArray& content)

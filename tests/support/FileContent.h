@@ -15,6 +15,10 @@ void putFile(const QString& path, const QByteArray& content);
 /// "(no file)" when there is none.
 QByteArray fileContent(const QString& path);
 
+/// Changes a bit, as a disk does it, which leaves the time as it was, or as a program.
+enum class Clock { Kept, Now };
+void flipBit(const QString& path, qint64 byte, Clock clock = Clock::Kept);
+
 /// The journal of a writer that was about to write the content.
 QByteArray journalOf(const QByteArray& content);
 

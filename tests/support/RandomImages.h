@@ -32,7 +32,7 @@ public:
     TagMap* next(const QByteArray& sopUID)
     {
         change(mLast.dataset(), 0);
-        mLast.with(DCM_SOPInstanceUID, sopUID.constData()).inSeries(oneIn(2) ? "1.2.3" : "1.2.4");
+        mLast.with(DCM_SOPInstanceUID, sopUID).inSeries(oneIn(2) ? "1.2.3" : "1.2.4");
         TagMap* map = mLast.map(kBound);
         if (oneIn(3))
             map->putAndInsertValue(kPreview, VrCode::OB, QByteArray(below(3), 'j'));

@@ -4,7 +4,6 @@
 #include "support/FileContent.h"
 
 #include <QDir>
-#include <QFile>
 #include <QJsonArray>
 #include <QJsonDocument>
 #include <QJsonObject>
@@ -84,8 +83,7 @@ protected:
     void save(const char* name, const DatasetBuilder& image) const
     {
         QDir().mkpath(images());
-        DcmFileFormat format(&image.dataset());
-        EXPECT_TRUE(format.saveFile(file(name).toUtf8().constData(), EXS_LittleEndianExplicit).good());
+        image.save(file(name));
     }
 
     QByteArray bytes(const char* name) const { return fileContent(file(name)); }

@@ -125,10 +125,10 @@ TEST_F(Correction, MovesThatAreKilledAreCompletedByTheNext)
             noise += QByteArray::number(static_cast<unsigned>(random()));
         const QByteArray uid = QByteArray::number(i);
         const QByteArray study = i < kMoving + kStaying ? "1.2" : "1.9";
-        save(uid.constData(), anImage(uid.constData())
-                                  .inStudy(study.constData())
+        save(uid.constData(), anImage(uid)
+                                  .inStudy(study)
                                   .inSeries((study + (i < kMoving ? ".1" : ".2")).constData())
-                                  .with(DCM_ImageComments, noise.constData()));
+                                  .with(DCM_ImageComments, noise));
         if (i < kMoving)
             moving.append(QString::fromLatin1(uid));
     }

@@ -66,10 +66,7 @@ TEST_F(BareTool, TakesImagesWithoutTheirPictures)
     const QString module = QStringLiteral("/kddlib/kdd-database.so");
     QDir().mkpath(path("bare/kddlib"));
     ASSERT_TRUE(QFile::copy(QStringLiteral(KDD_BUILD_FOLDER) + module, path("bare") + module));
-    DatasetBuilder image = anImage("5").inStudy("1.4").with(DCM_Rows, "2").with(DCM_Columns, "2");
-    image.with(DCM_SamplesPerPixel, "1").with(DCM_PhotometricInterpretation, "MONOCHROME2");
-    image.with(DCM_BitsAllocated, "8").with(DCM_BitsStored, "8").with(DCM_HighBit, "7");
-    save("5", image.with(DCM_PixelRepresentation, "0").bytes({0, 1, 2, 3}));
+    save("5", anImage("5").inStudy("1.4").asPicture(2, 2, 8).bytes({0, 1, 2, 3}));
     const Answer answer = run("add --json @");
     EXPECT_EQ(answer.exitCode, 0);
     EXPECT_EQ(answer.number("images"), 1);

@@ -13,20 +13,6 @@ namespace
 class Operations : public CommandLine
 {
 protected:
-    /// A picture that can be stacked.
-    static DatasetBuilder aSlice(const char* uid, int number, const char* study)
-    {
-        const QByteArray text = QByteArray::number(number);
-        DatasetBuilder image = anImage(uid).inStudy(study).inSeries((QByteArray(study) + ".1").constData());
-        image.with(DCM_PatientName, "Doe^J").with(DCM_InstanceNumber, text.constData());
-        image.with(DCM_ImagePositionPatient, ("0\\0\\" + text).constData()).with(DCM_PixelSpacing, "1\\1");
-        image.with(DCM_ImageOrientationPatient, "1\\0\\0\\0\\1\\0").with(DCM_FrameOfReferenceUID, study);
-        image.with(DCM_Columns, "4").with(DCM_Rows, "3").with(DCM_PhotometricInterpretation, "MONOCHROME2");
-        image.with(DCM_SamplesPerPixel, "1").with(DCM_BitsAllocated, "16").with(DCM_BitsStored, "16");
-        image.with(DCM_HighBit, "15").with(DCM_PixelRepresentation, "0");
-        return image.words({0, 1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11});
-    }
-
     /// Images 7.N.1 to 7.N.8 of studies 1.1 to 1.3, of which those with a number below `count` are there so far.
     void saveImages(int count)
     {
@@ -35,7 +21,11 @@ protected:
                 const QByteArray uid = "7." + QByteArray::number(study) + '.' + QByteArray::number(i);
                 const QByteArray studyUID = "1." + QByteArray::number(study);
                 if (!QFile::exists(file(uid.constData())))
-                    save(uid.constData(), aSlice(uid.constData(), i, studyUID.constData()));
+                    save(uid, aSlice(uid, i, i)
+                                  .inStudy(studyUID)
+                                  .inSeries(studyUID + ".1")
+                                  .with(DCM_FrameOfReferenceUID, studyUID)
+                                  .with(DCM_PatientName, "Doe^J"));
                 mExpected.insert(uid);
             }
         }

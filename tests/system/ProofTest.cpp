@@ -3,10 +3,6 @@
 
 #include <QThread>
 
-#include <fcntl.h>
-#include <sys/stat.h>
-#include <unistd.h>
-
 using namespace Kdd;
 
 namespace
@@ -29,21 +25,6 @@ protected:
         return TagFile::cacheFilePathForStudy(study);
     }
 
-    /// As a disk does it, which leaves the time as it was.
-    static void flip(const QString& path, qint64 at)
-    {
-        const int file = ::open(path.toUtf8().constData(), O_RDWR | O_CLOEXEC);
-        struct stat status = {};
-        char byte = 0;
-        ASSERT_EQ(::fstat(file, &status), 0) << path.toStdString();
-        ASSERT_EQ(::pread(file, &byte, 1, at), 1);
-        byte = static_cast<char>(byte ^ 1);
-        ASSERT_EQ(::pwrite(file, &byte, 1, at), 1);
-        const timespec times[2] = {status.st_atim, status.st_mtim};
-        ASSERT_EQ(::futimens(file, times), 0);
-        ::close(file);
-    }
-
     static QByteArray metrics(const QByteArray& address)
     {
         Client client(address);
@@ -59,7 +40,7 @@ TEST_F(Proof, VerifyTellsWhatATagFileIsAndHealsIt)
     save("5", anImage("5").inSeries("1.2.4"));
     addImages();
     putFile(tagFile("1.2"), first);
-    flip(tagFile("1.3"), 40);
+    flipBit(tagFile("1.3"), 40);
     const Answer told = kdd("verify --all");
     EXPECT_EQ(told.exitCode, 1);
     EXPECT_TRUE(told.err.contains("it is an earlier one of this archive; \"kdd build --all\""))
@@ -79,7 +60,7 @@ TEST_F(Proof, DeepVerifyTellsBitRotOfDicomFiles)
     EXPECT_EQ(kdd("verify --all --deep --json").number("undigested"), 4);
     EXPECT_EQ(kdd("verify --all --deep --record --json").number("recorded"), 4);
     // In a value that tag files leave out, so that nothing else would tell.
-    flip(file("1"), bytes("1").size() - 2);
+    flipBit(file("1"), bytes("1").size() - 2);
     EXPECT_EQ(kdd("verify --all").exitCode, 0);
     const Answer deep = kdd("verify --all --deep --json");
     EXPECT_EQ(deep.exitCode, 1);
@@ -93,8 +74,8 @@ TEST_F(Proof, AServerLooksInTheBackground)
     qputenv("KDD_FILE_DIGESTS", "1");
     addTwoStudies();
     EXPECT_EQ(kdd("verify --all --deep --json").number("undigested"), 0);
-    flip(file("1"), bytes("1").size() - 2);
-    flip(tagFile("1.3"), 40);
+    flipBit(file("1"), bytes("1").size() - 2);
+    flipBit(tagFile("1.3"), 40);
     qputenv("KDD_CHECK_RATE", "100");
     qputenv("KDD_CHECK_HEALS", "1");
     const auto server = start("--json serve --listen 127.0.0.1:0 --status 127.0.0.1:0");
@@ -136,7 +117,7 @@ TEST_F(Proof, AServerThatProvesServesNoWrongPreview)
     EXPECT_EQ(status(), 200);
     const qint64 name = fileContent(tagFile("1.2")).indexOf("1.2.840.10008.");
     ASSERT_GT(name, 0);
-    flip(tagFile("1.2"), name);
+    flipBit(tagFile("1.2"), name);
     EXPECT_EQ(status(), 500);
     EXPECT_EQ(kdd("verify --all --heal --json").number("healed"), 1);
     EXPECT_EQ(status(), 200);

@@ -25,7 +25,7 @@ protected:
         const auto server = serve(addresses);
         for (const int number : images) {
             const QByteArray uid = "1.2.3." + QByteArray::number(number);
-            save(uid.constData(), anImage(uid.constData()).with(DCM_PatientName, "Doe^J"));
+            save(uid.constData(), anImage(uid).with(DCM_PatientName, "Doe^J"));
             EXPECT_EQ(send(addresses, bytes(uid.constData())), 200);
         }
         server->terminate();

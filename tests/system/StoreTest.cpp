@@ -2,7 +2,6 @@
 #include "server/dimse/RawCaller.h"
 
 #include <QDirIterator>
-#include <QtEndian>
 
 #include <random>
 #include <set>
@@ -22,9 +21,9 @@ protected:
     QByteArray objectOf(int number) const
     {
         const QByteArray name = uidOf(number);
-        save(name.constData(), anImage(name.constData())
+        save(name.constData(), anImage(name)
                                    .with(DCM_PatientName, "Doe^J")
-                                   .with(DCM_InstanceNumber, QByteArray::number(number).constData())
+                                   .with(DCM_InstanceNumber, QByteArray::number(number))
                                    .withLong(DCM_TextValue, 5000));
         return bytes(name.constData());
     }
@@ -44,8 +43,7 @@ protected:
         if (caller.associate({{UID_SecondaryCaptureImageStorage, {UID_LittleEndianExplicitTransferSyntax}}})
                 .isEmpty())
             return false;
-        const int meta = qFromLittleEndian<qint32>(object.constData() + 140);
-        const int status = caller.store(UID_SecondaryCaptureImageStorage, uid, object.mid(144 + meta));
+        const int status = caller.store(UID_SecondaryCaptureImageStorage, uid, datasetOf(object));
         EXPECT_TRUE(status == 0 || status == -1) << status;
         return status == 0;
     }

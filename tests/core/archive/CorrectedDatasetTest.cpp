@@ -161,10 +161,9 @@ protected:
 
     void write()
     {
-        DcmFileFormat file(&mImage.dataset());
-        const QByteArray path = mFolder.filePath(QStringLiteral("file.dcm")).toLocal8Bit();
-        ASSERT_TRUE(file.saveFile(path.constData(), EXS_LittleEndianExplicit).good());
-        mSource = ByteSource::ofFile(QString::fromLocal8Bit(path));
+        const QString path = mFolder.filePath(QStringLiteral("file.dcm"));
+        mImage.save(path);
+        mSource = ByteSource::ofFile(path);
         ASSERT_TRUE(mIndex.read(mSource).good());
     }
 

@@ -127,20 +127,17 @@ protected:
     {
         const Kind& kind = GetParam();
         DatasetBuilder image = aPicture(kind.rows, kind.columns, kind.bitsAllocated, kind.photometric);
-        image.with(DCM_BitsStored, QByteArray::number(kind.bitsStored).constData());
-        image.with(DCM_HighBit, QByteArray::number(kind.bitsStored - 1).constData());
+        image.with(DCM_BitsStored, QByteArray::number(kind.bitsStored));
+        image.with(DCM_HighBit, QByteArray::number(kind.bitsStored - 1));
         image.with(DCM_PixelRepresentation, kind.isSigned ? "1" : "0").with(DCM_NumberOfFrames, "3");
         image.with(DCM_SamplesPerPixel, samples() == 3 ? "3" : "1");
         if (samples() == 3)
             image.with(DCM_PlanarConfiguration, kind.isPlanar ? "1" : "0");
         image.with(DCM_SOPClassUID, UID_SecondaryCaptureImageStorage).with(DCM_SOPInstanceUID, "1.2.3");
-        auto* element = new DcmPixelData(DcmTag(DCM_PixelData, kind.bitsAllocated > 8 ? EVR_OW : EVR_OB));
-        element->putUint8Array(reinterpret_cast<const Uint8*>(pixels.constData()),
-                               static_cast<Uint32>(pixels.size()));
-        DcmFileFormat file(&image.with(element).dataset());
-        const QByteArray path = mFolder.filePath(QStringLiteral("file.dcm")).toLocal8Bit();
-        EXPECT_TRUE(file.saveFile(path.constData(), EXS_LittleEndianExplicit).good());
-        return ByteSource::ofFile(QString::fromLocal8Bit(path));
+        image.data(DcmTag(DCM_PixelData, kind.bitsAllocated > 8 ? EVR_OW : EVR_OB), pixels);
+        const QString path = mFolder.filePath(QStringLiteral("file.dcm"));
+        image.save(path);
+        return ByteSource::ofFile(path);
     }
 
     /// What a decoder has to give: samples side by side, none of them shared.

@@ -44,12 +44,11 @@ protected:
     {
         const QByteArray study = "1." + QByteArray::number(1 + number % 3);
         const QByteArray uid = study + ".1." + QByteArray::number(number % 50 == 49 ? 7 : number);
-        const DatasetBuilder image = anImage(uid.constData())
-                                         .inStudy(study.constData())
-                                         .inSeries((study + ".1").constData())
-                                         .with(DCM_PatientName, number % 20 == 0 ? "Roe^R" : "Doe^J");
-        DcmFileFormat file(&image.dataset());
-        EXPECT_TRUE(file.saveFile(path(number).toUtf8().constData(), xfer).good());
+        anImage(uid)
+            .inStudy(study)
+            .inSeries(study + ".1")
+            .with(DCM_PatientName, number % 20 == 0 ? "Roe^R" : "Doe^J")
+            .save(path(number), xfer);
     }
 
     void fillFolder()
@@ -112,7 +111,7 @@ protected:
         EXPECT_TRUE(intake.finish().good());
         for (int study = 1; study <= 3; ++study) {
             const QByteArray uid = "1." + QByteArray::number(study);
-            const QString place = TagFile::cacheFilePathForStudy(uid.constData());
+            const QString place = TagFile::cacheFilePathForStudy(uid);
             taken.tagFiles.push_back(fileContent(place));
             QFile::remove(place);
             std::vector<Kxg::StudySummary> studies;

@@ -47,14 +47,6 @@ protected:
         expectSame(ScriptedServer(httpResponse(content)).url("a"), mFolder.filePath(QStringLiteral("a")));
     }
 
-    QByteArray saved(const DatasetBuilder& image, E_TransferSyntax xfer)
-    {
-        const QString path = mFolder.filePath(QStringLiteral("saved"));
-        DcmFileFormat file(&image.dataset());
-        EXPECT_TRUE(file.saveFile(path.toUtf8().constData(), xfer).good());
-        return fileContent(path);
-    }
-
     QTemporaryDir mFolder;
 };
 
@@ -70,8 +62,8 @@ TEST_F(ObjectInput, IsWhatAFileOfTheSameBytesIs)
             .bytes({1, 2, 3, 4}, DCM_DataSetTrailingPadding);
     for (const E_TransferSyntax xfer : {EXS_LittleEndianExplicit, EXS_LittleEndianImplicit,
                                         EXS_BigEndianExplicit, EXS_DeflatedLittleEndianExplicit})
-        expectSame(saved(image, xfer));
-    const QByteArray whole = saved(image, EXS_LittleEndianExplicit);
+        expectSame(image.file(xfer));
+    const QByteArray whole = image.file();
     expectSame(whole.chopped(1));
     expectSame(whole.left(50'000));
     expectSame(whole.mid(132));
@@ -83,7 +75,7 @@ TEST_F(ObjectInput, PassesOverFragmentsToTheLastOne)
 {
     DatasetBuilder image = anImage("1.2");
     image.fragments(EXS_JPEGProcess14SV1, {0, 70000, 4, 3000});
-    const QByteArray whole = saved(image, EXS_JPEGProcess14SV1);
+    const QByteArray whole = image.file(EXS_JPEGProcess14SV1);
     expectSame(whole);
     for (const int cut : {1, 3000, 4000})
         expectSame(whole.chopped(cut));
@@ -113,7 +105,7 @@ TEST_F(ObjectInput, IsUnusableWhenItIsNotToBeHad)
     };
     EXPECT_EQ(read(ScriptedServer(httpResponse("no", "403 Forbidden")).url("a")), "HTTP response code 403");
     const QByteArray image =
-        saved(anImage("1").withLong(DCM_TextValue, 100'000).with(DCM_CodeValue, "1"), EXS_BigEndianExplicit);
+        anImage("1").withLong(DCM_TextValue, 100'000).with(DCM_CodeValue, "1").file(EXS_BigEndianExplicit);
     EXPECT_THAT(read(ObjectServer(image,
                                   [](auto& answer) {
                                       if (answer.first > 0)

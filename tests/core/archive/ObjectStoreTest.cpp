@@ -1,8 +1,8 @@
 #include "kddlib/archive/ObjectStore.h"
 
+#include "kddlib/archive/ArchiveDatabase.h"
 #include "kddlib/archive/ArrivedStudies.h"
 #include "kddlib/tagfile/TagFile.h"
-#include "platform/database/Catalogue.h"
 #include "platform/database/Kxg.h"
 #include "support/DatasetBuilder.h"
 #include "support/FileContent.h"
@@ -33,14 +33,6 @@ protected:
         mRules.freeBytes = 0;
     }
 
-    std::unique_ptr<Kxg::Catalogue> catalogue() const
-    {
-        Result result;
-        auto opened = Kxg::Catalogue::open(mAddress, result);
-        EXPECT_TRUE(result.good()) << result.text().toStdString();
-        return opened;
-    }
-
     std::unique_ptr<ObjectStore> open(ArrivedStudies& studies) const
     {
         Result result;
@@ -49,21 +41,11 @@ protected:
         return store;
     }
 
-    static QByteArray fileOf(const DatasetBuilder& image)
-    {
-        QTemporaryDir folder;
-        const QString path = folder.filePath(QStringLiteral("a"));
-        DcmDataset copy(image.build());
-        DcmFileFormat format(&copy);
-        EXPECT_TRUE(format.saveFile(path.toUtf8().constData(), EXS_LittleEndianExplicit).good());
-        return fileContent(path);
-    }
-
     static ArrivedObject store(ObjectStore& store, Kxg::Catalogue& catalogue, const DatasetBuilder& image)
     {
         std::vector<std::unique_ptr<ObjectArrival>> arrivals;
         arrivals.push_back(store.begin());
-        const QByteArray bytes = fileOf(image);
+        const QByteArray bytes = image.file();
         arrivals[0]->take(bytes.constData(), bytes.size());
         arrivals[0]->end();
         return store.commit(arrivals, catalogue).at(0);
@@ -83,7 +65,7 @@ protected:
     std::string waiting() const
     {
         QVector<QByteArray> studies;
-        EXPECT_TRUE(catalogue()->waitingStudies(mRules.folder, studies).good());
+        EXPECT_TRUE(openCatalogue()->waitingStudies(mRules.folder, studies).good());
         return studies.toList().join(' ').toStdString();
     }
 
@@ -96,7 +78,7 @@ protected:
 TEST_F(ObjectStoreTest, LeavesAStudyThatWaitsAndCompletesIt)
 {
     ArrivedStudies studies({std::chrono::milliseconds(0), std::chrono::milliseconds(0)});
-    const auto database = catalogue();
+    const auto database = openCatalogue();
     const auto objects = open(studies);
     for (const char* uid : {"1.2.3.1", "1.2.3.2"})
         EXPECT_EQ(store(*objects, *database, anImage(uid)).reason.toStdString(), "");
@@ -117,7 +99,7 @@ TEST_F(ObjectStoreTest, LeavesAStudyThatWaitsAndCompletesIt)
 TEST_F(ObjectStoreTest, MergesArrivalsWithoutOpeningTheirFilesAgain)
 {
     ArrivedStudies studies;
-    const auto database = catalogue();
+    const auto database = openCatalogue();
     const auto objects = open(studies);
     store(*objects, *database, anImage("1.2.3.1"));
     ASSERT_TRUE(studies.complete("1.2", *database, 0).good());
@@ -135,7 +117,7 @@ TEST_F(ObjectStoreTest, MergesWhatAnotherServerTookAlongAndThatOneHasNothingLeft
 {
     ArrivedStudies one;
     ArrivedStudies other;
-    const auto database = catalogue();
+    const auto database = openCatalogue();
     const auto objectsOfOne = open(one);
     const auto objectsOfOther = open(other);
     for (const char* uid : {"1.2.3.1", "1.2.3.2", "1.2.3.3"})
@@ -166,17 +148,17 @@ TEST_F(ObjectStoreTest, TakesWhatTwoSendInOppositeOrderOnce)
 {
     ArrivedStudies studies;
     const auto objects = open(studies);
-    catalogue();
+    openCatalogue();
     const auto send = [&](bool isReversed) {
         std::vector<std::unique_ptr<ObjectArrival>> arrivals;
         for (int i = 0; i < 40; ++i) {
             // Each twice, too.
             const int number = (isReversed ? 39 - i : i) / 2;
-            const QByteArray bytes = fileOf(anImage(("1.2.3." + QByteArray::number(number)).constData()));
+            const QByteArray bytes = anImage("1.2.3." + QByteArray::number(number)).file();
             arrivals.push_back(objects->begin());
             arrivals.back()->take(bytes.constData(), bytes.size());
         }
-        for (const ArrivedObject& object : objects->commit(arrivals, *catalogue()))
+        for (const ArrivedObject& object : objects->commit(arrivals, *openCatalogue()))
             EXPECT_TRUE(object.isStored()) << object.reason.toStdString();
     };
     std::thread other([&] { send(true); });
@@ -188,11 +170,11 @@ TEST_F(ObjectStoreTest, TakesWhatTwoSendInOppositeOrderOnce)
 TEST_F(ObjectStoreTest, LeavesAloneWhatAnotherProcessCompletes)
 {
     ArrivedStudies studies;
-    const auto database = catalogue();
+    const auto database = openCatalogue();
     const auto objects = open(studies);
     store(*objects, *database, anImage("1.2.3.1"));
     {
-        const auto other = catalogue();
+        const auto other = openCatalogue();
         std::unique_ptr<Kxg::StudyClaim> claim;
         ASSERT_TRUE(other->claim("1.2", 0, claim).good());
         EXPECT_TRUE(studies.complete("1.2", *database, 10).bad());
@@ -210,7 +192,7 @@ TEST_F(ObjectStoreTest, TakesInOrRemovesWhatAServerLeftThatDied)
                   const auto objects = open(studies);
                   const auto half = objects->begin();
                   half->take("half", 4);
-                  const auto database = catalogue();
+                  const auto database = openCatalogue();
                   store(*objects, *database, anImage("1.2.3.1"));
                   ::raise(SIGKILL);
                   return false;
@@ -236,11 +218,11 @@ TEST_F(ObjectStoreTest, TakesInOrRemovesWhatAServerLeftThatDied)
                                  : ::link(staged.constData(), placed.constData()),
                   0);
     };
-    const QByteArray whole = fileOf(anImage("1.2.3.2"));
+    const QByteArray whole = anImage("1.2.3.2").file();
     leave("1.2.3.1", "1.2.3.1.dcm", {}, whole);
     leave("1.2.3.2", "1.2.3.2.dcm", whole, whole);
     // Something newer of its UID came while it lay there.
-    const QByteArray older = fileOf(anImage("1.2.3.1").with(DCM_PatientName, "Older"));
+    const QByteArray older = anImage("1.2.3.1").with(DCM_PatientName, "Older").file();
     leave("1.2.3.1", "1.2.3.1_0002.dcm", older, older);
     // The power went before its bytes were on the disk: it has its length, and none of them, or not all.
     leave("1.2.3.3", "1.2.3.3.dcm", QByteArray(whole.size(), '\0'), whole);
@@ -248,7 +230,7 @@ TEST_F(ObjectStoreTest, TakesInOrRemovesWhatAServerLeftThatDied)
           whole);
 
     ArrivedStudies studies;
-    const auto database = catalogue();
+    const auto database = openCatalogue();
     const auto objects = open(studies);
     const auto arriving = objects->begin();
     ASSERT_TRUE(objects->recover(*database).good());
@@ -264,10 +246,10 @@ TEST_F(ObjectStoreTest, TakesInOrRemovesWhatAServerLeftThatDied)
 TEST_F(ObjectStoreTest, TellsThatTheDiskIsFullAndLeavesNothing)
 {
     ArrivedStudies studies;
-    const auto database = catalogue();
+    const auto database = openCatalogue();
     const auto objects = open(studies);
     const DatasetBuilder large = anImage("1.2.3.1").words(std::vector<Uint16>(100000, 7));
-    const QByteArray bytes = fileOf(large);
+    const QByteArray bytes = large.file();
     {
         std::vector<std::unique_ptr<ObjectArrival>> arrivals;
         arrivals.push_back(objects->begin());
@@ -287,7 +269,7 @@ TEST_F(ObjectStoreTest, TellsThatTheDiskIsFullAndLeavesNothing)
 TEST_F(ObjectStoreTest, ReplacesWhatCannotBeReadAnyMore)
 {
     ArrivedStudies studies;
-    const auto database = catalogue();
+    const auto database = openCatalogue();
     const auto objects = open(studies);
     store(*objects, *database, anImage("1.2.3.1"));
     putFile(mFolder.filePath("objects/1.2/1.2.3/1.2.3.1.dcm"), "spoilt");

@@ -103,8 +103,7 @@ class PlainInputFile : public testing::Test
 protected:
     QString save(const DatasetBuilder& image, E_TransferSyntax xfer, E_EncodingType lengths)
     {
-        DcmFileFormat file(&image.dataset());
-        EXPECT_TRUE(file.saveFile(path().toUtf8().constData(), xfer, lengths).good());
+        image.save(path(), xfer, lengths);
         return path();
     }
 

@@ -20,14 +20,10 @@
 #include "support/Setting.h"
 #include "support/TemporaryStore.h"
 
-#include <QCryptographicHash>
 #include <QFile>
 #include <QThread>
 
-#include <fcntl.h>
 #include <gtest/gtest.h>
-#include <sys/stat.h>
-#include <unistd.h>
 
 #include <atomic>
 #include <thread>
@@ -49,36 +45,12 @@ constexpr int kStep = 41;  // every byte would take minutes there
 constexpr int kStep = 1;
 #endif
 
-enum class Time { Kept, Now };
-
-/// What a disk does to a byte, or a program.
-void flip(const QString& path, qint64 at, Time time = Time::Kept)
+DatasetBuilder aSlice(int number, const QByteArray& study = "1.1")
 {
-    const int file = ::open(path.toUtf8().constData(), O_RDWR | O_CLOEXEC);
-    struct stat status = {};
-    char byte = 0;
-    ASSERT_EQ(::fstat(file, &status), 0);
-    ASSERT_EQ(::pread(file, &byte, 1, at), 1);
-    byte = static_cast<char>(byte ^ (1 << (at % 8)));
-    ASSERT_EQ(::pwrite(file, &byte, 1, at), 1);
-    const timespec times[2] = {status.st_atim, status.st_mtim};
-    if (time == Time::Kept) {
-        ASSERT_EQ(::futimens(file, times), 0);
-    }
-    ::close(file);
-}
-
-DatasetBuilder aSlice(int number, const char* study = "1.1")
-{
-    const QByteArray text = QByteArray::number(number);
-    DatasetBuilder image = anImage((QByteArray(study) + ".7." + text).constData()).inStudy(study);
-    image.inSeries((QByteArray(study) + ".1").constData()).with(DCM_InstanceNumber, text.constData());
-    image.with(DCM_ImagePositionPatient, ("0\\0\\" + text).constData()).with(DCM_PixelSpacing, "1\\1");
-    image.with(DCM_ImageOrientationPatient, "1\\0\\0\\0\\1\\0").with(DCM_FrameOfReferenceUID, study);
-    image.with(DCM_Columns, "4").with(DCM_Rows, "3").with(DCM_PhotometricInterpretation, "MONOCHROME2");
-    image.with(DCM_SamplesPerPixel, "1").with(DCM_BitsAllocated, "16").with(DCM_BitsStored, "16");
-    image.with(DCM_HighBit, "15").with(DCM_PixelRepresentation, "0");
-    return image.words({0, 1, 2, 3, 1000, 2000, 3000, 4000, 4095, 5, 6, 7});
+    return Kdd::aSlice(study + ".7." + QByteArray::number(number), number, number)
+        .inStudy(study)
+        .inSeries(study + ".1")
+        .with(DCM_FrameOfReferenceUID, study);
 }
 
 /// All that readers are given of a volume file; empty when they are refused.
@@ -118,10 +90,8 @@ protected:
 
     QString save(const DatasetBuilder& image, const char* name) const
     {
-        DcmDataset copy(image.build());
-        DcmFileFormat format(&copy);
         const QString path = mFiles.filePath(QString::fromLatin1(name));
-        EXPECT_TRUE(format.saveFile(path.toUtf8().constData(), EXS_LittleEndianExplicit).good());
+        image.save(path);
         return path;
     }
 
@@ -211,10 +181,10 @@ TEST_P(StudyProofTest, EveryByteOfATagFileCounts)
     ASSERT_GT(file.statistics().volumes, 0);
     ASSERT_EQ(ofTagFile().tagFiles, 1);
     for (qint64 at = 0; at < size; at += QByteArray(GetParam()) == "Sqlite" ? kStep : 101) {
-        flip(tagFile(), at);
+        flipBit(tagFile(), at);
         ASSERT_EQ(ofTagFile().faults, 1) << at;
         ASSERT_TRUE(isTold("is damaged")) << at << mTold;
-        flip(tagFile(), at);
+        flipBit(tagFile(), at);
     }
     EXPECT_EQ(ofTagFile().faults, 0) << mTold;
     // What a longer study left behind its end says nothing.
@@ -273,7 +243,7 @@ TEST_P(StudyProofTest, AStudyThatWaitsAfterItsWriterDiedIsNoFault)
     std::unique_ptr<Kxg::StudyClaim> claim;
     ASSERT_TRUE(mCatalogue->requestBuild({"1.1"}).good());
     ASSERT_TRUE(mCatalogue->claim("1.1", 0, claim).good());
-    flip(tagFile(), 20, Time::Now);  // and it dies before the database knows
+    flipBit(tagFile(), 20, Clock::Now);  // and it dies before the database knows
     claim.reset();
     EXPECT_EQ(ofTagFile(true).faults, 0) << mTold;
     StudyBuilders(mObserver, 1).buildWaiting(1);
@@ -314,13 +284,13 @@ TEST_P(StudyProofTest, EveryByteOfADicomFileCountsOnceItHasADigest)
     EXPECT_EQ(ofFiles().undigested, 0);
     const QString path = mFiles.filePath(QStringLiteral("2"));
     for (qint64 at = 0; at < QFile(path).size(); at += QByteArray(GetParam()) == "Sqlite" ? kStep : 101) {
-        flip(path, at);
+        flipBit(path, at);
         ASSERT_EQ(ofFiles().faults, 1) << at;
         ASSERT_TRUE(isTold("/2 is damaged: its bytes have changed")) << mTold;
-        flip(path, at);
+        flipBit(path, at);
     }
     EXPECT_EQ(ofFiles().faults, 0) << mTold;
-    flip(path, QFile(path).size() - 2, Time::Now);
+    flipBit(path, QFile(path).size() - 2, Clock::Now);
     EXPECT_EQ(ofFiles(true).faults, 1);
     EXPECT_TRUE(isTold("was changed since it was registered")) << mTold;
     take({path});
@@ -340,32 +310,20 @@ TEST_P(StudyProofTest, AFlipInAVolumeFileIsNoticedOrHarmless)
     const qint64 size = QFile(QString::fromUtf8(path)).size();
     int noticed = 0;
     for (qint64 at = 0; at < size; at += QByteArray(GetParam()) == "Sqlite" ? kStep : 101) {
-        flip(QString::fromUtf8(path), at);
+        flipBit(QString::fromUtf8(path), at);
         const int faults = ofFiles().faults;
         noticed += faults;
         ASSERT_TRUE(faults == 1 || shownOf(path) == shown) << at;
-        flip(QString::fromUtf8(path), at);
+        flipBit(QString::fromUtf8(path), at);
     }
     EXPECT_GT(noticed, 0);
     // By its digest every byte counts.
     EXPECT_EQ(ofFiles(true).recorded, 4);
     for (qint64 at = 0; at < size; at += 41) {
-        flip(QString::fromUtf8(path), at);
+        flipBit(QString::fromUtf8(path), at);
         ASSERT_EQ(ofFiles().faults, 1) << at;
-        flip(QString::fromUtf8(path), at);
+        flipBit(QString::fromUtf8(path), at);
     }
-}
-
-TEST_P(StudyProofTest, WhoRegistersTakesDigestsWhereTheSiteWantsThem)
-{
-    const Setting digests("KDD_FILE_DIGESTS", "1");
-    fill();
-    std::vector<Kxg::FileDigest> files;
-    ASSERT_TRUE(mCatalogue->fileDigests("1.1", files).good());
-    ASSERT_EQ(files.size(), 4U);
-    for (const Kxg::FileDigest& file : files)
-        EXPECT_EQ(file.digest, QCryptographicHash::hash(fileContent(QString::fromUtf8(file.path)),
-                                                        QCryptographicHash::Sha256));
 }
 
 // ---- in the background
@@ -383,9 +341,9 @@ TEST_P(StudyProofTest, TheBackgroundFindsAndHealsAndGoesOnWhereItWas)
     fill();
     ofFiles(true);
     ofFiles(true, "1.2");
-    flip(tagFile(), QFile(tagFile()).size() - 5);
+    flipBit(tagFile(), QFile(tagFile()).size() - 5);
     const QString rotten = mFiles.filePath(QStringLiteral("4"));
-    flip(rotten, QFile(rotten).size() - 2);
+    flipBit(rotten, QFile(rotten).size() - 2);
     {
         BackgroundCheck first(kSwift);
         BackgroundCheck second(kSwift);
@@ -429,7 +387,7 @@ TEST_P(StudyProofTest, TheBackgroundEndsInTheMiddleAndLaterGoesOn)
     next.position = mFiles.filePath(QStringLiteral("2")).toUtf8();
     next.faults = 1;
     ASSERT_TRUE(mCatalogue->noteCheck(next, false).good());
-    flip(tagFile(), 20);
+    flipBit(tagFile(), 20);
     BackgroundCheck check(kSwift);
     check.start();
     ASSERT_TRUE(comesTrue([&] { return check.counts().studies == 2; }));

@@ -1,5 +1,6 @@
 #include "kddlib/archive/StudyWorkers.h"
 
+#include "kddlib/archive/ArchiveDatabase.h"
 #include "kddlib/archive/DicomInput.h"
 #include "kddlib/archive/Registration.h"
 #include "kddlib/tagfile/TagFile.h"
@@ -29,29 +30,16 @@ class StudyWorkersTest : public testing::TestWithParam<const char*>
 protected:
     StudyWorkersTest() { Kxg::SetDatabaseServer(mAddress); }
 
-    std::unique_ptr<Kxg::Catalogue> catalogue() const
-    {
-        Result result;
-        auto opened = Kxg::Catalogue::open(mAddress, result);
-        EXPECT_EQ(result.text().toStdString(), "");
-        return opened;
-    }
-
     /// Of the study "1.N" as many images.
     void index(int study, int images) const
     {
-        const auto database = catalogue();
+        const auto database = openCatalogue();
         Registration registration(*database);
         for (int i = 1; i <= images; ++i) {
             const QByteArray uid = "1." + QByteArray::number(study);
             const QByteArray name = uid + ".3." + QByteArray::number(i);
             const QString path = mStore.filePath(name.constData());
-            DcmDataset copy(anImage(name.constData())
-                                .inStudy(uid.constData())
-                                .inSeries((uid + ".3").constData())
-                                .build());
-            DcmFileFormat format(&copy);
-            EXPECT_TRUE(format.saveFile(path.toUtf8().constData(), EXS_LittleEndianExplicit).good());
+            anImage(name).inStudy(uid).inSeries(uid + ".3").save(path);
             EXPECT_TRUE(registration.add(readDicomInput(path.toUtf8(), Damage::Refused)).good());
         }
         EXPECT_TRUE(registration.flush().good());
@@ -60,7 +48,7 @@ protected:
     int countWaiting() const
     {
         int waiting = -1;
-        EXPECT_TRUE(catalogue()->countWaiting(waiting).good());
+        EXPECT_TRUE(openCatalogue()->countWaiting(waiting).good());
         return waiting;
     }
 
@@ -102,7 +90,7 @@ TEST_P(StudyWorkersTest, LeaveAloneWhatHasJustArrived)
 {
     index(1, 1);
     index(2, 1);
-    ASSERT_TRUE(catalogue()->requestBuild({"1.2"}).good());
+    ASSERT_TRUE(openCatalogue()->requestBuild({"1.2"}).good());
     StudyWorkers::Pace patient = kSwift;
     patient.arrivals = std::chrono::hours(24);
     StudyWorkers workers(1, patient);
@@ -111,21 +99,6 @@ TEST_P(StudyWorkersTest, LeaveAloneWhatHasJustArrived)
     workers.stop();
     EXPECT_EQ(workers.completed(), 1);
     EXPECT_FALSE(QFile::exists(TagFile::cacheFilePathForStudy("1.1")));
-}
-
-TEST_P(StudyWorkersTest, ShareTheWork)
-{
-    constexpr int kStudies = 20;
-    for (int i = 1; i <= kStudies; ++i)
-        index(i, 1);
-    StudyWorkers one(2, kSwift);
-    StudyWorkers other(2, kSwift);
-    one.start();
-    other.start();
-    EXPECT_TRUE(comesTrue([this] { return countWaiting() == 0; }));
-    one.stop();
-    other.stop();
-    EXPECT_EQ(one.completed() + other.completed(), kStudies);
 }
 
 TEST_P(StudyWorkersTest, TryAgainWhatFailedAndGoOnWithOthers)

@@ -33,8 +33,7 @@ protected:
         TagFile file;
         for (const QByteArray& uid : images) {
             const QByteArray series = study + ".3";
-            file.addTagMap(anImage(uid).inStudy(study.constData()).inSeries(series.constData()).map(),
-                           nullptr, true);
+            file.addTagMap(anImage(uid).inStudy(study).inSeries(series).map(), nullptr, true);
         }
         EXPECT_TRUE(file.writeCacheFile());
     }
@@ -59,8 +58,7 @@ protected:
     static QList<QByteArray> imagesInFile(const QByteArray& study)
     {
         TagFile file;
-        return file.readCacheFileForStudy(study.constData(), false) ? file.imagesByUID().keys()
-                                                                    : QList<QByteArray>();
+        return file.readCacheFileForStudy(study, false) ? file.imagesByUID().keys() : QList<QByteArray>();
     }
 
     TemporaryStore mStore;

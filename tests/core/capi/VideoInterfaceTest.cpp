@@ -38,8 +38,7 @@ protected:
     void save(const DatasetBuilder& image, const QByteArray& items,
               E_TransferSyntax syntax = EXS_MPEG4HighProfileLevel4_1)
     {
-        DcmFileFormat file(&image.dataset());
-        ASSERT_TRUE(file.saveFile(path().toLocal8Bit().constData(), syntax).good());
+        image.save(path(), syntax);
         const QByteArray pixelData("\xe0\x7f\x10\x00OB\x00\x00\xff\xff\xff\xff", 12);
         append(pixelData + items + QByteArray("\xfe\xff\xdd\xe0\0\0\0\0", 8));
     }
@@ -117,8 +116,7 @@ TEST_F(VideoInterface, NoPartOfAFileIsMistakenForItsVideo)
 TEST_F(VideoInterface, AUidThatDoesNotFitIsRefused)
 {
     for (const int length : {64, 65}) {
-        save(movie().with(DCM_SOPInstanceUID, QByteArray(length, '1').constData()),
-             item({}) + item("video!"));
+        save(movie().with(DCM_SOPInstanceUID, QByteArray(length, '1')), item({}) + item("video!"));
         EXPECT_EQ(told().first, length == 64 ? KDD_READ : KDD_NOT_READ);
     }
 }

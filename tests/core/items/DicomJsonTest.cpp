@@ -156,7 +156,7 @@ TEST(DicomJson, IsValidWhateverBytesTextsHold)
         for (auto left = random() % 12; left > 0; --left)
             text.append(pieces[random() % (sizeof pieces - 1)]);
         DatasetBuilder image = anItem().with(DCM_SpecificCharacterSet, characterSets[random() % 6]);
-        image.with(DCM_PatientName, text.constData()).with(DCM_PatientComments, text.constData());
+        image.with(DCM_PatientName, text).with(DCM_PatientComments, text);
         const QByteArray json = QByteArray::fromStdString(jsonOf(image));
         ASSERT_EQ(QString::fromUtf8(json).toUtf8(), json) << text.toHex().constData();
         ASSERT_TRUE(QJsonDocument::fromJson(json).isObject()) << text.toHex().constData();

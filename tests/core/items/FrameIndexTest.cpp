@@ -302,8 +302,7 @@ TEST(FrameIndex, FindsValuesInSequences)
         for (E_TransferSyntax syntax : {EXS_LittleEndianExplicit, EXS_LittleEndianImplicit}) {
             const QTemporaryDir folder;
             const QString path = folder.filePath(QStringLiteral("a.dcm"));
-            DcmFileFormat file(&image.dataset());
-            ASSERT_TRUE(file.saveFile(path.toLocal8Bit().constData(), syntax, lengths).good());
+            image.save(path, syntax, lengths);
             ByteSource source = ByteSource::ofFile(path);
             FrameIndex index;
             FileStretch value;

@@ -188,8 +188,7 @@ TEST_F(ItemOfTagFile, LoadsItsFileOnceAndComplainsOnce)
 {
     const QTemporaryDir folder;
     const QByteArray path = folder.filePath(QStringLiteral("1_s.dcm")).toLocal8Bit();
-    DatasetBuilder image = anImage("1").withLong(DCM_ImageComments, 5000);
-    DcmFileFormat(&image.dataset()).saveFile(path.constData(), EXS_LittleEndianExplicit);
+    anImage("1").withLong(DCM_ImageComments, 5000).save(QFile::decodeName(path));
     file.findImage("1")->putAndInsertValue(kFilePath, VrCode::LO, path);
     const std::shared_ptr<DcmDataset> loaded = file.findImageEx("1", "")->obtainDcmDataset();
     ASSERT_NE(loaded, nullptr);

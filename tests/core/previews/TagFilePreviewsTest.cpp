@@ -145,12 +145,9 @@ TEST_F(TagFilePreviews, AnImageKeepsItsPreviewAndElseTheReasonIsLogged)
     std::vector<Uint8> pixels(64 * 64);
     for (std::size_t i = 0; i < pixels.size(); ++i)
         pixels[i] = static_cast<Uint8>(i * i);
-    DatasetBuilder image = anImage("1.7").with(DCM_Rows, "64").with(DCM_Columns, "64").with(DCM_HighBit, "7");
-    image.with(DCM_BitsAllocated, "8").with(DCM_BitsStored, "8").with(DCM_SamplesPerPixel, "1");
-    image.with(DCM_PhotometricInterpretation, "MONOCHROME2").with(DCM_PixelRepresentation, "0");
-    image.dataset().putAndInsertUint8Array(DCM_PixelData, pixels.data(), pixels.size());
+    const DatasetBuilder image = anImage("1.7").asPicture(64, 64, 8).bytes(pixels);
     const QString path = mStore.filePath("image");
-    DcmFileFormat(&image.dataset()).saveFile(path.toUtf8().constData(), EXS_LittleEndianExplicit);
+    image.save(path);
     add(file, image);
     add(file, anImage("1.8"));
 

@@ -53,15 +53,14 @@ protected:
         const QByteArray series = QByteArray(study) + ".1";
         return anImage(uid)
             .inStudy(study)
-            .inSeries(series.constData())
+            .inSeries(series)
             .with(DCM_PatientName, "Doe^J")
             .with(DCM_InstanceNumber, "1");
     }
 
     void save(const DatasetBuilder& image, const QByteArray& name)
     {
-        DcmFileFormat file(&image.dataset());
-        ASSERT_TRUE(file.saveFile(path(name).constData(), EXS_LittleEndianExplicit).good());
+        image.save(QFile::decodeName(path(name)));
         const std::unique_ptr<TagMap> map(image.map());
         registerFiles({{fileRecord(*map, path(name), {})}, {}, {}});
     }
@@ -83,7 +82,7 @@ protected:
         Kxg::StudyContents contents;
         ASSERT_TRUE(mCatalogue->studyContents(study, contents).good());
         if (contents.images.empty() && contents.volumes.isEmpty()) {
-            QFile::remove(TagFile::cacheFilePathForStudy(study.constData()));
+            QFile::remove(TagFile::cacheFilePathForStudy(study));
             EXPECT_TRUE(claim->finishRemoved().good());
             return;
         }
@@ -196,7 +195,7 @@ protected:
         std::string all;
         for (const QByteArray& study : studies) {
             TagFile file;
-            file.readCacheFileForStudy(study.constData(), false);
+            file.readCacheFileForStudy(study, false);
             all += study.toStdString() + ":\n" + imagesText(file);
         }
         return all;
@@ -235,7 +234,7 @@ protected:
     {
         Files files;
         for (const QByteArray& study : studies) {
-            const QString path = TagFile::cacheFilePathForStudy(study.constData());
+            const QString path = TagFile::cacheFilePathForStudy(study);
             if (QFile::exists(path))
                 files[study] = fileContent(path);
         }
@@ -245,7 +244,7 @@ protected:
     static void putBack(const Uids& studies, const Files& files)
     {
         for (const QByteArray& study : studies) {
-            const QString path = TagFile::cacheFilePathForStudy(study.constData());
+            const QString path = TagFile::cacheFilePathForStudy(study);
             QFile::remove(path);
             if (files.count(study) > 0)
                 putFile(path, files.at(study));

@@ -18,8 +18,8 @@ protected:
     static void fill(TagFile& file)
     {
         for (const char* uid : {"1", "2", "3"}) {
-            DatasetBuilder image = anImage(uid).with(DCM_PatientComments, noise(*uid).constData());
-            image.with(DCM_ImageComments, noise(*uid).constData());
+            DatasetBuilder image = anImage(uid).with(DCM_PatientComments, noise(*uid));
+            image.with(DCM_ImageComments, noise(*uid));
             image.withItem(DCM_RequestAttributesSequence, anItem().with(DCM_CodeValue, uid));
             add(file, image)->putAndInsertValue(kPreview, VrCode::OB, QByteArray(uid) + "jpeg");
         }

@@ -43,7 +43,7 @@ void askAll(Asked& asked)
 
 void replaceImage(Asked& asked)
 {
-    TagMap* image = anImage(uidOf(3).constData()).with(DCM_StudyDescription, "AB").map();
+    TagMap* image = anImage(uidOf(3)).with(DCM_StudyDescription, "AB").map();
     asked.file.addTagMap(image, nullptr, true);
 }
 

@@ -65,7 +65,7 @@ protected:
         const QByteArray mark = "only of " + name + ';';
         DatasetBuilder made = image(uid.constData(), study.constData());
         made.with(DCM_ImageComments, "x")
-            .withItem(DCM_ReferencedStudySequence, anItem().with(DCM_PatientComments, mark.constData()));
+            .withItem(DCM_ReferencedStudySequence, anItem().with(DCM_PatientComments, mark));
         made.with(DcmTag(0x0071, 0x0010, EVR_LO), "Other").with(DcmTag(0x0071, 0x1021, EVR_LO), "theirs");
         save(uid.isEmpty() ? made.without(DCM_SOPInstanceUID) : made, name);
         mImages[uid.isEmpty() ? path(name) : uid] = {study, study + ".1", mark.toStdString(), {}, 0, ""};
@@ -172,7 +172,7 @@ protected:
         std::string all;
         for (const QByteArray& study : mAll) {
             TagFile file;
-            file.readCacheFileForStudy(study.constData(), false);
+            file.readCacheFileForStudy(study, false);
             EXPECT_EQ(file.imagesByUID().keys(), imagesOf(study)) << study.constData();
             std::map<const TagMap*, int> volumes = volumesOf(file);
             for (auto it = file.imagesByUID().cbegin(); it != file.imagesByUID().cend(); ++it) {

@@ -31,7 +31,7 @@ protected:
     static void fill(TagFile& file, int from, int to)
     {
         for (int i = from; i <= to; ++i) {
-            DatasetBuilder image = anImage(QByteArray::number(i).constData());
+            DatasetBuilder image = anImage(QByteArray::number(i));
             for (int word = 1; word < 20; ++word)
                 image.withItem(
                     DCM_RequestAttributesSequence,

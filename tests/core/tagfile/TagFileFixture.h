@@ -13,13 +13,9 @@
 #include "support/TreeText.h"
 
 #include <QDataStream>
-#include <QDir>
-#include <QFile>
-#include <QFileInfo>
 
 #include <gtest/gtest.h>
 
-#include <map>
 #include <memory>
 
 namespace Kdd

@@ -84,10 +84,10 @@ TEST_F(TagFileMerge, ImagesHoldNothingThatTheirSeriesSaysOfItself)
         TagFile stored;
         TagFile fresh;
         for (int i = 0; i < 4; ++i)
-            add(stored, anImage(QByteArray::number(i).constData()));
+            add(stored, anImage(QByteArray::number(i)));
         add(stored, anImage("s").inSeries("1.2.9"));
         for (int i = 0; i < numFresh; ++i)
-            add(fresh, anImage(("f" + QByteArray::number(i)).constData()));
+            add(fresh, anImage("f" + QByteArray::number(i)));
         for (TagFile* file : {&stored, &fresh}) {
             file->study()->putAndInsertInt(kFromDatabase, 1);
             file->findSeries("1.2.3")->putAndInsertInt(kHasVolumeFile, 1);
@@ -108,7 +108,7 @@ TEST_F(TagFileMerge, WhatMostImagesShowStandsOnceWhenTheyHaveBecomeTheMost)
 {
     const auto addImages = [](TagFile& file, const char* prefix, int count, const char* part) {
         for (int i = 0; i < count; ++i)
-            add(file, anImage((prefix + QByteArray::number(i)).constData()).with(DCM_BodyPartExamined, part));
+            add(file, anImage(prefix + QByteArray::number(i)).with(DCM_BodyPartExamined, part));
     };
     TagFile stored;
     TagFile fresh;
@@ -132,13 +132,13 @@ TEST_F(TagFileMerge, ASeriesKeepsItsMarkOfAVolumeFileAndGivesItToNoOther)
         TagFile fresh;
         for (const char* seriesUID : {"1.2.3", "1.2.9"}) {
             for (int i = 0; i < 4; ++i)
-                add(stored, anImage((seriesUID + QByteArray::number(i)).constData()).inSeries(seriesUID));
+                add(stored, anImage(seriesUID + QByteArray::number(i)).inSeries(seriesUID));
             stored.findSeries(seriesUID)->putAndInsertInt(kHasVolumeFile, 1);
         }
         stored.study()->optimizeAll();
         ASSERT_TRUE(stored.study()->tagsForLevel().contains(kHasVolumeFile)) << "all its series have one";
         for (int i = 0; i < numFresh; ++i)
-            add(fresh, anImage(("f" + QByteArray::number(i)).constData()));
+            add(fresh, anImage("f" + QByteArray::number(i)));
         add(fresh, anImage("n").inSeries("1.2.8"));
         ASSERT_TRUE(stored.writeCacheFile() && fresh.mergeIntoCacheFile());
         for (const char* seriesUID : {"1.2.3", "1.2.9"})

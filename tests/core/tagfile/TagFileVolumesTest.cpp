@@ -19,7 +19,7 @@ protected:
 
     void addImage(const QByteArray& uid, int number)
     {
-        add(file, anImage(uid.constData()).with(DCM_InstanceNumber, QByteArray::number(number).constData()));
+        add(file, anImage(uid).with(DCM_InstanceNumber, QByteArray::number(number)));
     }
 
     QByteArray indexesOf(const char* sopUID) const

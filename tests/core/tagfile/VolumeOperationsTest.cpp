@@ -29,10 +29,7 @@ protected:
 
     TagMap* newImage(const QByteArray& uid, const QByteArray& series)
     {
-        return anImage(uid.constData())
-            .inSeries(series.constData())
-            .with(DCM_InstanceNumber, QByteArray::number(any(9)).constData())
-            .map();
+        return anImage(uid).inSeries(series).with(DCM_InstanceNumber, QByteArray::number(any(9))).map();
     }
 
     /// Also one without UID, which is known by its path.

@@ -17,20 +17,10 @@
 namespace Kdd
 {
 
-/// An axial image of 4 x 3 pixels of 16 bits, half a millimetre wide and 0.25 mm high, at (x, y, z) [mm].
+/// Named by its number.
 inline DatasetBuilder aSlice(int number, double z, double y = 0, double x = 0)
 {
-    const std::string position = QString::asprintf("%g\\%g\\%g", x, y, z).toStdString();
-    const std::string text = std::to_string(number);
-    DatasetBuilder slice = anImage(text.c_str());
-    slice.with(DCM_InstanceNumber, text.c_str()).with(DCM_ImagePositionPatient, position.c_str());
-    slice.with(DCM_ImageOrientationPatient, "1\\0\\0\\0\\1\\0").with(DCM_PixelSpacing, "0.25\\0.5");
-    slice.with(DCM_Columns, "4").with(DCM_Rows, "3").with(DCM_PhotometricInterpretation, "MONOCHROME2");
-    slice.with(DCM_SamplesPerPixel, "1").with(DCM_BitsAllocated, "16").with(DCM_BitsStored, "16");
-    slice.with(DCM_HighBit, "15").with(DCM_PixelRepresentation, "0");
-    const Uint16 pixels[12] = {0, 1, 2, 3, 1000, 2000, 3000, 4000, 4095, 5, 6, 7};
-    slice.dataset().putAndInsertUint16Array(DCM_PixelData, pixels, 12);
-    return slice;
+    return aSlice(QByteArray::number(number), number, z, y, x);
 }
 
 using Images = std::vector<DatasetBuilder>;

@@ -56,7 +56,7 @@ protected:
         for (const DatasetBuilder& image : images) {
             const QByteArray file = path(QByteArray::number(files.size() + 1) + ".dcm");
             files.append(QFile::decodeName(file));
-            DcmFileFormat(&image.dataset()).saveFile(file.constData(), EXS_LittleEndianExplicit);
+            image.save(files.last());
         }
         mSeries = std::make_unique<StackSeries>(files);
         return mSeries->plans().front().stacks.first();

@@ -2,8 +2,6 @@
 #include "support/Process.h"
 #include "support/Threads.h"
 
-#include <QDirIterator>
-
 #include <fcntl.h>
 
 #include <atomic>

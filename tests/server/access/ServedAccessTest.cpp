@@ -1,11 +1,6 @@
-#include "server/Server.h"
+#include "server/ServerFixture.h"
 #include "server/access/TokenIssuer.h"
-#include "server/http/Client.h"
-#include "support/DatasetBuilder.h"
-#include "support/LogCapture.h"
-#include "support/TemporaryStore.h"
 
-#include <gtest/gtest.h>
 #include <kddlib/TagFile.h>
 #include <kddlib/TagMap.h>
 
@@ -18,7 +13,7 @@ namespace
 constexpr qint64 kFarAway = 4'000'000'000;  // [s since 1970]
 
 /// A server over a store of one study.
-class ServedAccess : public testing::Test
+class ServedAccess : public ServerFixture
 {
 protected:
     ServedAccess()
@@ -26,23 +21,6 @@ protected:
         TagFile file;
         file.addTagMap(anImage("1.2.3.1").map(), nullptr, true);
         EXPECT_TRUE(file.writeCacheFile());
-        mSettings.http.address = {"127.0.0.1", 0};
-    }
-
-    std::string refusal()
-    {
-        Result result;
-        EXPECT_EQ(Server::make(mSettings, result), nullptr);
-        return result.text().toStdString();
-    }
-
-    void start()
-    {
-        Result result;
-        mServer = Server::make(mSettings, result);
-        if (result.good())
-            result = mServer->start();
-        ASSERT_EQ(result.text(), QString());
     }
 
     void useTokens(const TokenIssuer& issuer)
@@ -62,18 +40,7 @@ protected:
         mSettings.http.keyFile = mTls.key();
     }
 
-    Reply ask(const QByteArray& method, const QByteArray& path, const QByteArray& headers = {}) const
-    {
-        Client client(mServer->address());
-        client.send(method + ' ' + path + " HTTP/1.1\r\nHost: localhost\r\nContent-Length: 0\r\n" + headers +
-                    "\r\n");
-        return client.reply(method == "HEAD" ? Client::Body::StaysBehind : Client::Body::Follows);
-    }
-
-    TemporaryStore mStore;
     TlsFiles mTls;
-    ServerSettings mSettings;
-    std::unique_ptr<Server> mServer;
 };
 
 TEST_F(ServedAccess, ShowsNothingToABadToken)

@@ -1,15 +1,8 @@
-#include "server/Server.h"
+#include "server/ServerFixture.h"
 #include "server/access/TestProvider.h"
-#include "server/http/Client.h"
-#include "support/DatasetBuilder.h"
 #include "support/FileContent.h"
-#include "support/LogCapture.h"
-#include "support/TemporaryStore.h"
 
 #include <QDir>
-
-#include <gtest/gtest.h>
-#include <kddlib/Kxg.h>
 
 using namespace Kdd;
 using namespace Kdd::Access;
@@ -20,13 +13,11 @@ namespace
 const QByteArray kOpened = "Sec-Fetch-Mode: navigate\r\n";
 
 /// A server at which people sign in, and a browser.
-class SignInTest : public testing::Test
+class SignInTest : public ServerFixture
 {
 protected:
     SignInTest()
     {
-        Kxg::SetDatabaseServer("sqlite:" + mStore.filePath("kdd.sqlite").toUtf8());
-        mSettings.http.address = {"127.0.0.1", 0};
         putFile(mStore.filePath("secret"), "a+b\n");
         useKeys(QByteArray(64, 'a'));
     }
@@ -46,24 +37,18 @@ protected:
             R"(","secretFile":")" + mStore.filePath("secret").toUtf8() + R"("},"audit":")" +
             mStore.filePath("audit.jsonl").toUtf8() + "\"}";
         ASSERT_EQ(AccessRules::parse(file, mSettings.access.emplace()).text(), QString());
-        Result result;
-        mServer.reset();
-        mServer = Server::make(mSettings, result);
-        ASSERT_EQ((mServer != nullptr ? mServer->start() : result).text(), QString());
+        ServerFixture::start();
     }
 
     /// Keeps the cookies that the answer sets.
     Reply ask(const QByteArray& method, const QByteArray& path, const QByteArray& headers = {},
               const QByteArray& body = {})
     {
-        Client client(mServer->address());
         QByteArray cookies;
         for (auto each = mCookies.begin(); each != mCookies.end(); ++each)
             cookies += (cookies.isEmpty() ? "Cookie: " : "; ") + each.key() + '=' + each.value();
-        client.send(method + ' ' + path +
-                    " HTTP/1.1\r\nHost: localhost\r\nContent-Length: " + QByteArray::number(body.size()) +
-                    "\r\n" + headers + (cookies.isEmpty() ? "" : cookies + "\r\n") + "\r\n" + body);
-        const Reply reply = client.reply();
+        const Reply reply =
+            ServerFixture::ask(method, path, headers + (cookies.isEmpty() ? "" : cookies + "\r\n"), body);
         for (const QByteArray& line : reply.head.split('\n')) {
             if (!line.startsWith("Set-Cookie: "))
                 continue;
@@ -94,10 +79,7 @@ protected:
     }
     Reply signIn() { return ask("GET", backFrom()); }
 
-    TemporaryStore mStore;
     TestProvider mProvider;
-    ServerSettings mSettings;
-    std::unique_ptr<Server> mServer;
     QMap<QByteArray, QByteArray> mCookies;
 };
 
@@ -225,14 +207,10 @@ TEST_F(SignInTest, LeadsNowhereElse)
 
 TEST_F(SignInTest, ChangesNothingForPagesOfOthers)
 {
-    mSettings.objects.emplace();
-    mSettings.objects->folder = mStore.filePath("objects").toUtf8();
-    mSettings.objects->freeBytes = 0;
+    takeObjects();
     start();
     signIn();
-    const QString sent = mStore.filePath("sent.dcm");
-    DcmFileFormat object(&anImage("1.2.3.1").inStudy("1.2").dataset());
-    ASSERT_TRUE(object.saveFile(sent.toUtf8().constData(), EXS_LittleEndianExplicit).good());
+    const QByteArray sent = anImage("1.2.3.1").file();
     const struct
     {
         const char* headers;
@@ -249,8 +227,7 @@ TEST_F(SignInTest, ChangesNothingForPagesOfOthers)
     };
     for (const auto& each : kOrigins) {
         const QByteArray headers = QByteArray(each.headers) + "Content-Type: application/dicom\r\n";
-        EXPECT_EQ(ask("POST", "/dicom-web/studies", headers, fileContent(sent)).status, each.status)
-            << each.headers;
+        EXPECT_EQ(ask("POST", "/dicom-web/studies", headers, sent).status, each.status) << each.headers;
         EXPECT_EQ(QDir(mStore.filePath("objects/1.2")).exists(), each.status == 200) << each.headers;
         EXPECT_EQ(status("GET", "/browser/config", each.headers), 200) << each.headers;
     }
@@ -279,22 +256,15 @@ TEST_F(SignInTest, WorksBehindTheAddressThatBrowsersKnow)
 
 TEST_F(SignInTest, TellsWhenTheProviderCannotBeAsked)
 {
-    const LogCapture log;
     start();
     mSettings.access->signIn->discovery = "http://127.0.0.1:1/none";
-    Result result;
-    mServer.reset();
-    mServer = Server::make(mSettings, result);
-    ASSERT_TRUE(mServer->start().good());
+    ServerFixture::start();
     for (int i = 0; i < 2; ++i)
         EXPECT_EQ(status("GET", "/", kOpened), 503);
     EXPECT_EQ(status("GET", "/page/app.js"), 200);
-    EXPECT_EQ(log.count("Nobody can sign in: http://127.0.0.1:1/none"), 1);
+    EXPECT_EQ(mLog.count("Nobody can sign in: http://127.0.0.1:1/none"), 1);
     mSettings.access->signIn->sessionKeys = mStore.filePath("none");
-    EXPECT_EQ(Server::make(mSettings, result), nullptr);
-    EXPECT_TRUE(result.text().contains(QLatin1String("none")));
-    // It logs, and the capture of the log ends here.
-    mServer.reset();
+    EXPECT_NE(refusal().find("none"), std::string::npos);
 }
 
 }  // namespace

@@ -1,14 +1,8 @@
-#include "server/Server.h"
+#include "server/ServerFixture.h"
 #include "server/access/RightsTable.h"
 #include "server/access/TokenIssuer.h"
-#include "server/http/Client.h"
-#include "support/DatasetBuilder.h"
-#include "support/TemporaryStore.h"
 
 #include <QDir>
-
-#include <gtest/gtest.h>
-#include <kddlib/Kxg.h>
 
 using namespace Kdd;
 using namespace Kdd::Access;
@@ -19,7 +13,7 @@ namespace
 constexpr qint64 kFarAway = 4'000'000'000;  // [s since 1970]
 
 /// An archive of a study "1.2" of North and one "1.9" of South, and those who may see what is North's only.
-class StudyLimits : public testing::Test
+class StudyLimits : public ServerFixture
 {
 protected:
     StudyLimits()
@@ -28,11 +22,7 @@ protected:
         save("north", anImage("1.2.3.1").with(DCM_InstitutionName, "North").with(DCM_PatientName, "A"));
         save("south", southern("1.9.3.1"));
         kdd({QStringLiteral("add"), mStore.filePath("images")});
-        Kxg::SetDatabaseServer("sqlite:" + mStore.filePath("kdd.sqlite").toUtf8());
-        mSettings.http.address = {"127.0.0.1", 0};
-        mSettings.objects.emplace();
-        mSettings.objects->folder = mStore.filePath("objects").toUtf8();
-        mSettings.objects->freeBytes = 0;
+        takeObjects();
         mSettings.changes.corrections = mSettings.changes.deletions = true;
         putFile(mStore.filePath("keys.json"), mIssuer.keySet());
         const QByteArray file =
@@ -41,9 +31,7 @@ protected:
             R"(","rights":[{"gives":["read","store","correct","delete"]}],)" +
             R"("studies":[{"claim":"sites","attribute":"InstitutionName"}]}})";
         EXPECT_EQ(AccessRules::parse(file, mSettings.access.emplace()).text(), QString());
-        Result result;
-        mServer = Server::make(mSettings, result);
-        EXPECT_EQ((mServer != nullptr ? mServer->start() : result).text(), QString());
+        start();
     }
 
     static DatasetBuilder southern(const char* uid)
@@ -56,21 +44,8 @@ protected:
     }
     void save(const char* name, const DatasetBuilder& image) const
     {
-        DcmDataset copy(image.build());
-        DcmFileFormat file(&copy);
-        const QByteArray target = mStore.filePath("images").toUtf8() + '/' + name;
-        EXPECT_TRUE(file.saveFile(target.constData(), EXS_LittleEndianExplicit).good());
+        image.save(mStore.filePath("images/") + QLatin1String(name));
     }
-    void kdd(const QStringList& arguments) const
-    {
-        QProcess process;
-        process.start(QStringLiteral(KDD_BINARY),
-                      QStringList{QStringLiteral("--store"), mStore.folder(), QStringLiteral("--quiet")} +
-                          arguments);
-        ASSERT_TRUE(process.waitForFinished(120000));
-        ASSERT_EQ(process.exitCode(), 0) << process.readAllStandardError().toStdString();
-    }
-
     /// A header with a token of the sites; without sites it has no such claim.
     QByteArray token(const QJsonValue& sites) const
     {
@@ -82,10 +57,7 @@ protected:
     Reply ask(const QByteArray& method, const QByteArray& path, const QByteArray& headers,
               const QByteArray& body = {}, const QByteArray& type = "application/dicom") const
     {
-        Client client(mServer->address());
-        client.send(method + ' ' + path + " HTTP/1.1\r\nHost: localhost\r\nContent-Type: " + type + "\r\n" +
-                    headers + "Content-Length: " + QByteArray::number(body.size()) + "\r\n\r\n" + body);
-        return client.reply(method == "HEAD" ? Client::Body::StaysBehind : Client::Body::Follows);
+        return ServerFixture::ask(method, path, "Content-Type: " + type + "\r\n" + headers, body);
     }
     QByteArray get(const QByteArray& path, const QByteArray& headers) const
     {
@@ -124,10 +96,7 @@ protected:
         return all;
     }
 
-    TemporaryStore mStore;
     const TokenIssuer mIssuer;
-    ServerSettings mSettings;
-    std::unique_ptr<Server> mServer;
 };
 
 TEST_F(StudyLimits, AnswerOfEveryResourceAsIfOthersDidNotExist)
@@ -199,12 +168,8 @@ TEST_F(StudyLimits, FollowTheClaim)
 TEST_F(StudyLimits, FollowCorrectionsAndArrivals)
 {
     const QByteArray north = token(QStringLiteral("North"));
-    const auto fileOf = [&](const DatasetBuilder& image) {
-        save("sent", image);
-        return fileContent(mStore.filePath("images/sent"));
-    };
     const auto store = [&](const DatasetBuilder& image, const QByteArray& path = "/dicom-web/studies") {
-        const Reply reply = ask("POST", path, north, fileOf(image));
+        const Reply reply = ask("POST", path, north, image.file());
         return reply.status * 1000 + reply.body.contains("292");  // 0124, not allowed
     };
     EXPECT_EQ(store(anImage("1.2.3.2").with(DCM_InstitutionName, "North")), 200000);

@@ -78,7 +78,7 @@ TEST_P(ChangeMeetsOthers, LosesNothingWhenAllComeAtOnce)
     };
     for (int sender = 1; sender <= 2; ++sender)
         for (int i = 0; i < kEach; ++i)
-            store(anImage(uid(sender, i).constData()).with(DCM_PatientName, "Doe^John"));
+            store(anImage(uid(sender, i)).with(DCM_PatientName, "Doe^John"));
     std::vector<std::thread> threads;
     for (int sender = 1; sender <= 2; ++sender)
         threads.emplace_back([&, sender] {
@@ -89,7 +89,7 @@ TEST_P(ChangeMeetsOthers, LosesNothingWhenAllComeAtOnce)
         });
     threads.emplace_back([&] {
         for (int i = 0; i < kEach; ++i)
-            store(anImage(uid(3, i).constData()).with(DCM_PatientName, "Doe^John"));
+            store(anImage(uid(3, i)).with(DCM_PatientName, "Doe^John"));
     });
     threads.emplace_back([&] {
         kdd({QStringLiteral("build"), QStringLiteral("--all"), QStringLiteral("--again")});

@@ -1,62 +1,31 @@
 #pragma once
 
-#include "server/Server.h"
-#include "server/http/Client.h"
-#include "support/DatasetBuilder.h"
+#include "server/ServerFixture.h"
 #include "support/FileContent.h"
-#include "support/LogCapture.h"
 #include "support/PostgresServer.h"
-#include "support/TemporaryStore.h"
 
-#include <QJsonArray>
-#include <QJsonDocument>
-#include <QJsonObject>
-#include <QProcess>
-
-#include <gtest/gtest.h>
-#include <kddlib/Kxg.h>
 #include <kddlib/TagFile.h>
 
 namespace Kdd
 {
 
 /// A server that takes objects and corrections, and deletes, over a store of its own.
-class ChangedArchive : public testing::Test
+class ChangedArchive : public ServerFixture
 {
 protected:
     explicit ChangedArchive(const QByteArray& database = {})
-        : mDatabase(database.isEmpty() ? "sqlite:" + mStore.filePath("kdd.sqlite").toUtf8() : database)
+        : ServerFixture(database)
     {
-        Kxg::SetDatabaseServer(mDatabase);
-        mSettings.http.address = {"127.0.0.1", 0};
-        mSettings.objects.emplace();
-        mSettings.objects->folder = mStore.filePath("objects").toUtf8();
-        mSettings.objects->freeBytes = 0;
+        takeObjects();
         mSettings.changes.corrections = true;
         mSettings.changes.deletions = true;
-    }
-
-    void start()
-    {
-        Result result;
-        mServer.reset();
-        mServer = Server::make(mSettings, result);
-        ASSERT_NE(mServer, nullptr) << result.text().toStdString();
-        ASSERT_TRUE(mServer->start().good());
     }
 
     Reply ask(const QByteArray& method, const QByteArray& path, const QByteArray& type = {},
               const QByteArray& body = {}, const QByteArray& headers = {}) const
     {
-        Client client(mServer->address());
-        client.send(method + ' ' + path + " HTTP/1.1\r\nHost: localhost\r\n" +
-                    (type.isEmpty() ? QByteArray() : "Content-Type: " + type + "\r\n") +
-                    "Content-Length: " + QByteArray::number(body.size()) + "\r\n" + headers + "\r\n" + body);
-        return client.reply();
-    }
-    Reply get(const QByteArray& path, const QByteArray& headers = {}) const
-    {
-        return ask("GET", "/dicom-web" + path, {}, {}, headers);
+        return ServerFixture::ask(
+            method, path, (type.isEmpty() ? QByteArray() : "Content-Type: " + type + "\r\n") + headers, body);
     }
     Reply remove(const QByteArray& path) const { return ask("DELETE", "/dicom-web" + path); }
 
@@ -71,13 +40,7 @@ protected:
     /// Sends an image; its path below that of DICOMweb, where it is told to be.
     void store(const DatasetBuilder& image) const
     {
-        const QByteArray path = mStore.filePath("sent.dcm").toUtf8();
-        DcmDataset copy(image.build());
-        DcmFileFormat format(&copy);
-        ASSERT_TRUE(format.saveFile(path.constData(), EXS_LittleEndianExplicit).good());
-        EXPECT_EQ(ask("POST", "/dicom-web/studies", "application/dicom", fileContent(QString::fromUtf8(path)))
-                      .status,
-                  200);
+        EXPECT_EQ(ask("POST", "/dicom-web/studies", "application/dicom", image.file()).status, 200);
     }
 
     /// Two images in series 1.2.3, one in 1.2.4, all of study 1.2.
@@ -115,25 +78,6 @@ protected:
                 kinds << change[QLatin1String("change")].toString();
         return kinds.join(QLatin1Char(' ')).toStdString();
     }
-
-    /// Runs the tool over the same archive.
-    void kdd(const QStringList& arguments) const
-    {
-        QProcess process;
-        process.start(QStringLiteral(KDD_BINARY),
-                      QStringList{QStringLiteral("--store"), mStore.folder(), QStringLiteral("--meta"),
-                                  QString::fromUtf8(TagFile::metaFolder()), QStringLiteral("--database"),
-                                  QString::fromUtf8(mDatabase), QStringLiteral("--quiet")} +
-                          arguments);
-        ASSERT_TRUE(process.waitForFinished(120000));
-        ASSERT_EQ(process.exitCode(), 0) << process.readAllStandardError().toStdString();
-    }
-
-    LogCapture mLog;
-    TemporaryStore mStore;
-    QByteArray mDatabase;
-    ServerSettings mSettings;
-    std::unique_ptr<Server> mServer;
 };
 
 }  // namespace Kdd

@@ -58,8 +58,7 @@ TEST_F(HistoryTest, TellsOfManyImagesAndOfLogsThatCannotBeRead)
     AuditLog broken;
     broken.append({QStringLiteral("no time"), {}});
     for (int i = 0; i < 500; ++i) {
-        std::unique_ptr<TagMap> map(
-            anImage(QByteArray("1.2.3." + QByteArray::number(1000 + i)).constData()).map());
+        std::unique_ptr<TagMap> map(anImage(QByteArray("1.2.3." + QByteArray::number(1000 + i))).map());
         ASSERT_TRUE((i == 400 ? broken : log).store(*map));
         if (i == 300)
             map->putAndInsertString(AuditLog::keysIn(*map).first(), "no base64!");

@@ -46,17 +46,6 @@ TEST(JobText, SaysTheSameInBothForms)
     }
 }
 
-TEST(JobText, NamesImagesInJson)
-{
-    QAData job;
-    QString reason;
-    ASSERT_TRUE(readJob(R"({"images":["1.2","1.3"],"series":["1.4"],"wholeStudy":true})", JobForm::Json, job,
-                        reason));
-    EXPECT_EQ(job.images, (QList<QByteArray>{"1.2", "1.3"}));
-    EXPECT_EQ(job.series, QList<QByteArray>{"1.4"});
-    EXPECT_TRUE(job.isOfWholeStudy);
-}
-
 const std::pair<const char*, const char*> kFaults[] = {
     {"", "no JSON object"},
     {"[]", "no JSON object"},

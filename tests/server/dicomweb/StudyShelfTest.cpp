@@ -7,7 +7,6 @@
 #include "support/TemporaryStore.h"
 #include "support/Threads.h"
 
-#include <QDir>
 #include <QFile>
 
 #include <fcntl.h>

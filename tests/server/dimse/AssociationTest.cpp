@@ -2,6 +2,8 @@
 #include "server/dimse/DimseFixture.h"
 #include "server/dimse/PduGuard.h"
 
+#include <QtEndian>
+
 using namespace Kdd;
 
 namespace

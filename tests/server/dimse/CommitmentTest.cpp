@@ -3,9 +3,6 @@
 
 #include <gmock/gmock.h>
 #include <kddlib/Catalogue.h>
-#include <netinet/in.h>
-#include <sys/socket.h>
-#include <unistd.h>
 
 using namespace Kdd;
 using testing::HasSubstr;
@@ -53,18 +50,6 @@ protected:
     }
 
     QString fileOf(const char* uid) const { return storedFiles().filter(QLatin1String(uid)).value(0); }
-
-    static quint16 freePort()
-    {
-        sockaddr_in at = {};
-        socklen_t size = sizeof at;
-        at.sin_family = AF_INET;
-        const int socket = ::socket(AF_INET, SOCK_STREAM, 0);
-        EXPECT_EQ(::bind(socket, reinterpret_cast<sockaddr*>(&at), size), 0);
-        EXPECT_EQ(::getsockname(socket, reinterpret_cast<sockaddr*>(&at), &size), 0);
-        ::close(socket);
-        return ntohs(at.sin_port);
-    }
 };
 
 TEST_F(CommitmentTest, TellsOfEachObjectWhetherItIsSafe)
@@ -112,9 +97,8 @@ TEST_F(CommitmentTest, IsTriedUntilTheServerEndsAndThenToldAsLost)
     mSettings.dimse->rules.peers.insert("CT1", {{}, "127.0.0.1", freePort(), false, Dimse::Right::Store});
     mSettings.dimse->linger = std::chrono::hours(1);
     fill();
-    const DatasetBuilder object = anItem()
-                                      .with(DCM_ReferencedSOPClassUID, kCapture.constData())
-                                      .with(DCM_ReferencedSOPInstanceUID, "1.2.3.1");
+    const DatasetBuilder object =
+        anItem().with(DCM_ReferencedSOPClassUID, kCapture).with(DCM_ReferencedSOPInstanceUID, "1.2.3.1");
     const QByteArray asked =
         bytesOf(anItem().with(DCM_TransactionUID, "1.9.9").withItem(DCM_ReferencedSOPSequence, object),
                 EXS_LittleEndianImplicit);

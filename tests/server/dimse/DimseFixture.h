@@ -1,22 +1,9 @@
 #pragma once
 
-#include "server/Server.h"
+#include "server/ServerFixture.h"
 #include "server/dimse/RawCaller.h"
-#include "server/http/Client.h"
-#include "support/DatasetBuilder.h"
-#include "support/FileContent.h"
-#include "support/LogCapture.h"
-#include "support/TemporaryStore.h"
-
-#include <QDirIterator>
-#include <QJsonArray>
-#include <QJsonDocument>
-#include <QProcess>
-#include <QtEndian>
 
 #include <dcmtk/dcmdata/dcostrmb.h>
-#include <gtest/gtest.h>
-#include <kddlib/Kxg.h>
 
 namespace Kdd
 {
@@ -27,36 +14,17 @@ const QByteArray kCapture = UID_SecondaryCaptureImageStorage;
 const QByteArray kEcho = UID_VerificationSOPClass;
 
 /// A server that has associations, over a store of its own.
-class DimseFixture : public testing::Test
+class DimseFixture : public ServerFixture
 {
 protected:
     DimseFixture()
     {
-        Kxg::SetDatabaseServer("sqlite:" + mStore.filePath("kdd.sqlite").toUtf8());
-        mSettings.http.address = {"127.0.0.1", 0};
-        mSettings.objects.emplace();
-        mSettings.objects->folder = mStore.filePath("objects").toUtf8();
-        mSettings.objects->freeBytes = 0;
-        mSettings.dimse.emplace();
-        mSettings.dimse->address = {"127.0.0.1", 0};
-        mSettings.dimse->rules = Dimse::AssociationRules::open();
+        takeObjects();
+        takeAssociations(mSettings);
         mSettings.dimse->rules.titles = {"KDD"};
     }
 
-    void start()
-    {
-        Result result;
-        mServer.reset();
-        mServer = Server::make(mSettings, result);
-        ASSERT_NE(mServer, nullptr) << result.text().toStdString();
-        ASSERT_TRUE(mServer->start().good());
-    }
-
-    QString port() const
-    {
-        const QByteArray address = mServer->dimseAddress();
-        return QString::fromLatin1(address.mid(address.lastIndexOf(':') + 1));
-    }
+    QString port() const { return QString::number(dicomPort(*mServer)); }
 
     struct Said
     {
@@ -92,9 +60,7 @@ protected:
                  E_TransferSyntax syntax = EXS_LittleEndianExplicit) const
     {
         const QString path = mStore.filePath(name);
-        DcmDataset copy(image.build());
-        DcmFileFormat format(&copy);
-        EXPECT_TRUE(format.saveFile(path.toUtf8().constData(), syntax).good());
+        image.save(path, syntax);
         return path;
     }
 
@@ -118,33 +84,6 @@ protected:
         caller.associate({{sopClass, {kExplicit}}});
         return caller.store(sopClass, instance, bytesOf(image));
     }
-
-    Reply get(const QByteArray& path) const
-    {
-        Client client(mServer->address());
-        client.get("/dicom-web" + path);
-        return client.reply();
-    }
-
-    int instances(const QByteArray& study = "1.2") const
-    {
-        return QJsonDocument::fromJson(get("/studies/" + study + "/instances").body).array().size();
-    }
-
-    QStringList storedFiles() const
-    {
-        QStringList names;
-        QDirIterator files(mStore.filePath("objects"), {QStringLiteral("*.dcm")}, QDir::Files,
-                           QDirIterator::Subdirectories);
-        while (files.hasNext())
-            names.append(files.next());
-        return names;
-    }
-
-    LogCapture mLog;
-    TemporaryStore mStore;
-    ServerSettings mSettings;
-    std::unique_ptr<Server> mServer;
 };
 
 }  // namespace Kdd

@@ -41,19 +41,62 @@ QByteArray command(const QByteArray& elements)
     return QByteArray(4, 0) + little<quint32>(4) + little(static_cast<quint32>(elements.size())) + elements;
 }
 
+int newSocket()
+{
+    return ::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
+}
+
+sockaddr_in portOfThisMachine(quint16 port)
+{
+    sockaddr_in at = {};
+    at.sin_family = AF_INET;
+    at.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    at.sin_port = htons(port);
+    return at;
+}
+
+bool connects(int socket, quint16 port)
+{
+    const sockaddr_in there = portOfThisMachine(port);
+    return ::connect(socket, reinterpret_cast<const sockaddr*>(&there), sizeof there) == 0;
+}
+
 }  // namespace
 
-RawCaller::RawCaller(const QByteArray& address)
-    : mSocket(::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0))
+quint16 freePort()
 {
-    sockaddr_in there = {};
-    there.sin_family = AF_INET;
-    there.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-    there.sin_port = htons(address.mid(address.lastIndexOf(':') + 1).toUShort());
+    sockaddr_in at = portOfThisMachine(0);
+    socklen_t size = sizeof at;
+    const int socket = newSocket();
+    EXPECT_EQ(::bind(socket, reinterpret_cast<sockaddr*>(&at), size), 0);
+    EXPECT_EQ(::getsockname(socket, reinterpret_cast<sockaddr*>(&at), &size), 0);
+    ::close(socket);
+    return ntohs(at.sin_port);
+}
+
+bool isListening(quint16 port)
+{
+    const int socket = newSocket();
+    const bool isThere = connects(socket, port);
+    ::close(socket);
+    return isThere;
+}
+
+QByteArray datasetOf(const QByteArray& file)
+{
+    constexpr int kToLength = 140;
+    return file.size() < kToLength + 4
+               ? QByteArray()
+               : file.mid(kToLength + 4 + qFromLittleEndian<qint32>(file.constData() + kToLength));
+}
+
+RawCaller::RawCaller(const QByteArray& address)
+    : mSocket(newSocket())
+{
     const timeval time = {kPatience, 0};
     ::setsockopt(mSocket, SOL_SOCKET, SO_RCVTIMEO, &time, sizeof time);
     // One that fails is seen by what does not come.
-    static_cast<void>(::connect(mSocket, reinterpret_cast<const sockaddr*>(&there), sizeof there));
+    connects(mSocket, address.mid(address.lastIndexOf(':') + 1).toUShort());
 }
 
 RawCaller::~RawCaller()

@@ -6,6 +6,14 @@
 namespace Kdd
 {
 
+/// A port of this machine that nobody listens at; a moment later somebody may.
+quint16 freePort();
+
+bool isListening(quint16 port);
+
+/// What stands behind the meta information of a DICOM file; empty when there is none.
+QByteArray datasetOf(const QByteArray& file);
+
 /// One side of an association, byte by byte, to a server of this machine. What takes longer than a test may last fails.
 class RawCaller
 {

@@ -2,7 +2,6 @@
 #include "server/faults/Served.h"
 
 #include <QDirIterator>
-#include <QtEndian>
 
 #include <dcmtk/dcmdata/dcuid.h>
 #include <sys/statvfs.h>
@@ -57,7 +56,7 @@ protected:
 
     QByteArray fileOf(const QByteArray& uid, int words)
     {
-        save(uid.constData(), anImage(uid.constData()).words(std::vector<Uint16>(std::size_t(words), 7)));
+        save(uid.constData(), anImage(uid).words(std::vector<Uint16>(std::size_t(words), 7)));
         return fileContent(file(uid.constData()));
     }
 
@@ -73,12 +72,9 @@ protected:
 
     int associate(const QByteArray& uid, const QByteArray& content) const
     {
-        constexpr int kToLength = 140;
         RawCaller caller(mDicom);
         caller.associate({{kCapture, {UID_LittleEndianExplicitTransferSyntax}}});
-        return caller.store(
-            kCapture, uid,
-            content.mid(kToLength + 4 + qFromLittleEndian<qint32>(content.constData() + kToLength)));
+        return caller.store(kCapture, uid, datasetOf(content));
     }
 
     int found() const { return QJsonDocument::fromJson(get("studies/1.2/instances").body).array().size(); }

@@ -31,7 +31,7 @@ protected:
             const QByteArray uid = QByteArray::number(i);
             // What does not get much shorter.
             const QByteArray comment = QCryptographicHash::hash(uid, QCryptographicHash::Sha256).toHex();
-            save(uid.constData(), anImage(uid.constData()).with(DCM_ImageComments, comment.constData()));
+            save(uid.constData(), anImage(uid).with(DCM_ImageComments, comment));
         }
         ASSERT_EQ(addImages().exitCode, 0);
     }

@@ -1,6 +1,7 @@
 #pragma once
 
 #include "server/http/Client.h"
+#include "support/BytesRead.h"
 #include "support/Setting.h"
 #include "support/Threads.h"
 #include "system/CommandLineFixture.h"
@@ -74,12 +75,7 @@ protected:
             .size();
     }
 
-    /// Resident memory [KiB].
-    qint64 memory() const
-    {
-        const QByteArray text = fileContent(QStringLiteral("/proc/%1/status").arg(mServer->processId()));
-        return text.mid(text.indexOf("VmRSS:") + 6).trimmed().split(' ').first().toLongLong();
-    }
+    qint64 memory() const { return residentMemory(QString::number(mServer->processId())); }
 
     /// Whether the condition comes true while the server is asked, which takes longer than what it has to do.
     template <typename Condition>
@@ -108,10 +104,8 @@ protected:
         for (std::size_t i = 0; i < words.size(); ++i)
             words[i] = static_cast<Uint16>(value + i / (1024 * 512));
         DatasetBuilder image = anImage(sopUID);
-        image.with(DCM_Rows, "512").with(DCM_Columns, "1024").with(DCM_BitsAllocated, "16");
-        image.with(DCM_BitsStored, "16").with(DCM_HighBit, "15").with(DCM_PixelRepresentation, "0");
-        image.with(DCM_SamplesPerPixel, "1").with(DCM_PhotometricInterpretation, "MONOCHROME2");
-        return image.with(DCM_NumberOfFrames, QByteArray::number(frames).constData()).words(words);
+        image.asPicture(512, 1024, 16).with(DCM_NumberOfFrames, QByteArray::number(frames));
+        return image.words(words);
     }
 
     std::unique_ptr<QProcess> mServer;

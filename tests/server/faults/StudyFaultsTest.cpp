@@ -26,7 +26,7 @@ protected:
     void saveImage(int number) const
     {
         const QByteArray uid = "1.2.3." + QByteArray::number(number);
-        save(uid.constData(), anImage(uid.constData())
+        save(uid.constData(), anImage(uid)
                                   .inSeries(number % 2 == 0 ? "1.2.3" : "1.2.4")
                                   .with(DCM_PatientName, "0")
                                   .withLong(DCM_ImageComments, 900));

@@ -1,14 +1,11 @@
 #include "server/http/Client.h"
 #include "server/http/RunningServer.h"
+#include "support/BytesRead.h"
+#include "support/FileContent.h"
 
-#include <QFile>
-#include <QTemporaryDir>
-
-#include <gtest/gtest.h>
 #include <unistd.h>
 
 #include <atomic>
-#include <thread>
 
 using namespace Kdd;
 
@@ -59,22 +56,15 @@ private:
     std::atomic<int>* mMade;
 };
 
-class HttpBodies : public testing::Test
+class HttpBodies : public FileTest
 {
 protected:
     std::shared_ptr<const Http::OpenFile> aFile(const QByteArray& content)
     {
-        QFile file(path());
-        EXPECT_TRUE(file.open(QIODevice::WriteOnly));
-        EXPECT_EQ(file.write(content), content.size());
-        file.close();
+        putFile(path(), content);
         Result result;
         return Http::OpenFile::open(path().toLocal8Bit(), result);
     }
-
-    QString path() const { return mFolder.filePath(QStringLiteral("file")); }
-
-    QTemporaryDir mFolder;
 };
 
 TEST_F(HttpBodies, ConsistOfBytesRangesAndBlocksInTheirOrder)
@@ -218,15 +208,6 @@ TEST_F(HttpBodies, AndHeadersThatCannotBeSentAreReplaced)
     EXPECT_EQ(client.reply().body, "45");
 }
 
-/// Resident memory of this process [KiB].
-qint64 memory()
-{
-    QFile file(QStringLiteral("/proc/self/status"));
-    EXPECT_TRUE(file.open(QIODevice::ReadOnly));
-    const QByteArray text = file.readAll();
-    return text.mid(text.indexOf("VmRSS:") + 6).trimmed().split(' ').first().toLongLong();
-}
-
 TEST_F(HttpBodies, OfClientsThatDoNotReadTakeLittleMemoryAndHoldUpNobody)
 {
     constexpr int kClients = 1000;
@@ -243,7 +224,7 @@ TEST_F(HttpBodies, OfClientsThatDoNotReadTakeLittleMemoryAndHoldUpNobody)
             return response;
         },
         settings);
-    const qint64 before = memory();
+    const qint64 before = residentMemory();
     std::vector<std::unique_ptr<Client>> clients;
     for (int i = 0; i < kClients; ++i) {
         clients.push_back(std::make_unique<Client>(server.address(), Client::Tls::No, 4096));
@@ -255,7 +236,7 @@ TEST_F(HttpBodies, OfClientsThatDoNotReadTakeLittleMemoryAndHoldUpNobody)
     another.get("/a");
     EXPECT_EQ(another.reply().body, "a");
     EXPECT_LT(made, kClients * kBlocks / 2) << "blocks are made as clients take them";
-    EXPECT_LT(memory() - before, 200 * 1024) << "of 64 MiB for each client";
+    EXPECT_LT(residentMemory() - before, 200 * 1024) << "of 64 MiB for each client";
 }
 
 TEST_F(HttpBodies, OfAClientThatTakesNothingAreBrokenOff)

@@ -27,6 +27,7 @@ namespace Kdd::DicomWeb
 {
 
 constexpr const char* kInstance = "studies/1.2/series/1.2.3/instances/1.2.3.1";
+constexpr const char* kObject = "requestType=WADO&studyUID=1.2&seriesUID=1.2.3&objectUID=1.2.3.1&";
 constexpr const char* kStored = "application/dicom; transfer-syntax=*";
 constexpr int kFrameBytes = 16 * 16 * 2;
 
@@ -36,18 +37,11 @@ inline DatasetBuilder anImageWithFrames(int frames, const char* sopUID = "1.2.3.
     QByteArray pixels(frames * kFrameBytes, 0);
     for (int i = 0; i < pixels.size(); ++i)
         pixels[i] = static_cast<char>((i / kFrameBytes + 1) * 7 + i % 5);
-    DatasetBuilder image = anImage(sopUID).with(DCM_PatientName, "Wrong^Name").with(DCM_Rows, "16");
-    image.with(DCM_Columns, "16")
-        .with(DCM_BitsAllocated, "16")
-        .with(DCM_BitsStored, "16")
-        .with(DCM_HighBit, "15");
-    image.with(DCM_SamplesPerPixel, "1").with(DCM_PixelRepresentation, "0");
-    image.with(DCM_PhotometricInterpretation, "MONOCHROME2");
-    image.with(DCM_NumberOfFrames, QByteArray::number(frames).constData());
-    auto* element = new DcmPixelData(DcmTag(DCM_PixelData, EVR_OW));
-    element->putUint8Array(reinterpret_cast<const Uint8*>(pixels.constData()),
-                           static_cast<Uint32>(pixels.size()));
-    return image.with(element);
+    return anImage(sopUID)
+        .with(DCM_PatientName, "Wrong^Name")
+        .asPicture(16, 16, 16)
+        .with(DCM_NumberOfFrames, QByteArray::number(frames))
+        .data(DcmTag(DCM_PixelData, EVR_OW), pixels);
 }
 
 inline QByteArray frameOf(int number)
@@ -79,10 +73,8 @@ protected:
     void write(const char* name, const DatasetBuilder& image,
                E_TransferSyntax syntax = EXS_LittleEndianExplicit)
     {
-        DcmDataset copy(image.build());
-        DcmFileFormat file(&copy);
-        ASSERT_TRUE(file.getDataset()->chooseRepresentation(syntax, nullptr).good());
-        ASSERT_TRUE(file.saveFile(path(name).toLocal8Bit().constData(), syntax).good());
+        ASSERT_TRUE(image.dataset().chooseRepresentation(syntax, nullptr).good());
+        image.save(path(name), syntax);
     }
 
     /// Puts the file into its study's tag file, as if it lay in `place`, which may be a URL.
@@ -138,6 +130,18 @@ protected:
                 return resource->answer(request, parsed);
         }
         return Http::failure(404, QStringLiteral("nobody's path"));
+    }
+
+    /// As older viewers ask, all in parameters.
+    Http::Response getByUri(const QByteArray& parameters, const QByteArray& accept = "*/*")
+    {
+        Http::Request request;
+        request.headers = {{"accept", accept}};
+        for (const QByteArray& pair : parameters.split('&')) {
+            if (!pair.isEmpty())
+                request.query.append({pair.left(pair.indexOf('=')), pair.mid(pair.indexOf('=') + 1)});
+        }
+        return get("wado", request);
     }
 
     static QByteArray bodyOf(Http::Response& response)

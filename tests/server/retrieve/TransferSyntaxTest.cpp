@@ -53,9 +53,13 @@ protected:
 
 TEST_F(TransferSyntaxTest, IsTheOneThatIsAskedForWithAllPixelsAndCorrections)
 {
-    for (E_TransferSyntax stored : {EXS_LittleEndianImplicit, EXS_BigEndianExplicit,
+    for (E_TransferSyntax stored : {EXS_LittleEndianExplicit, EXS_LittleEndianImplicit, EXS_BigEndianExplicit,
                                     EXS_DeflatedLittleEndianExplicit, EXS_RLELossless}) {
         add("a.dcm", anImageWithFrames(kFrames), stored);
+        Http::Response frame = get(QByteArray(kInstance) + "/frames/2", "application/octet-stream");
+        EXPECT_EQ(bodyOf(frame), frameOf(1)) << DcmXfer(stored).getXferName();
+        Http::Response whole = get(QByteArray(kInstance) + "/pixeldata", "application/octet-stream");
+        EXPECT_EQ(bodyOf(whole), mPixels) << DcmXfer(stored).getXferName();
         correct(DCM_PatientName, "Right^Name");
         for (E_TransferSyntax wanted : kWritten) {
             Http::Response response = get(kInstance, asked(wanted));

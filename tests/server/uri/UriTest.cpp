@@ -1,7 +1,6 @@
 #include "server/retrieve/RetrieveFixture.h"
 
 #include <QImage>
-#include <QList>
 
 using namespace Kdd;
 using namespace Kdd::DicomWeb;
@@ -9,25 +8,12 @@ using namespace Kdd::DicomWeb;
 namespace
 {
 
-constexpr const char* kObject = "requestType=WADO&studyUID=1.2&seriesUID=1.2.3&objectUID=1.2.3.1&";
-
 class UriTest : public RetrieveTest
 {
 protected:
-    Http::Response ask(const QByteArray& parameters, const QByteArray& accept = "*/*")
-    {
-        Http::Request request;
-        request.headers = {{"accept", accept}};
-        for (const QByteArray& pair : parameters.split('&')) {
-            if (!pair.isEmpty())
-                request.query.append({pair.left(pair.indexOf('=')), pair.mid(pair.indexOf('=') + 1)});
-        }
-        return get("wado", request);
-    }
-
     Http::Response object(const QByteArray& parameters, const QByteArray& accept = "*/*")
     {
-        return ask(kObject + parameters, accept);
+        return getByUri(kObject + parameters, accept);
     }
 
     QImage picture(const QByteArray& parameters)
@@ -102,11 +88,11 @@ TEST_F(UriTest, NeedsAllItsParameters)
     add("a.dcm", anImageWithFrames(1));
     const QByteArray whole = kObject;
     for (const char* name : {"requestType", "studyUID", "seriesUID", "objectUID"})
-        EXPECT_EQ(ask(QByteArray(whole).replace(name, "other")).status, 400) << name;
-    EXPECT_EQ(ask(QByteArray(whole).replace("WADO", "QIDO")).status, 400);
-    EXPECT_EQ(ask(QByteArray(whole).replace("studyUID=1.2", "studyUID=../1.2")).status, 400);
-    EXPECT_EQ(ask(QByteArray(whole).replace("studyUID=1.2", "studyUID=1.9")).status, 404);
-    EXPECT_EQ(ask(QByteArray(whole).replace("seriesUID=1.2.3", "seriesUID=1.2.4")).status, 404);
+        EXPECT_EQ(getByUri(QByteArray(whole).replace(name, "other")).status, 400) << name;
+    EXPECT_EQ(getByUri(QByteArray(whole).replace("WADO", "QIDO")).status, 400);
+    EXPECT_EQ(getByUri(QByteArray(whole).replace("studyUID=1.2", "studyUID=../1.2")).status, 400);
+    EXPECT_EQ(getByUri(QByteArray(whole).replace("studyUID=1.2", "studyUID=1.9")).status, 404);
+    EXPECT_EQ(getByUri(QByteArray(whole).replace("seriesUID=1.2.3", "seriesUID=1.2.4")).status, 404);
 }
 
 TEST_F(UriTest, DrawsAsThePathsDo)
@@ -125,32 +111,6 @@ TEST_F(UriTest, DrawsAsThePathsDo)
     request.query = {{"window", "2000,900,linear"}};
     Http::Response path = get(QByteArray(kInstance) + "/frames/1/rendered", request);
     EXPECT_EQ(QImage::fromData(bodyOf(path)), whole);
-}
-
-TEST_F(UriTest, GivesCorrectionsAndMovedImagesUnderTheirNewStudyOnly)
-{
-    add("a.dcm", anImageWithFrames(1));
-    add("b.dcm", anImageWithFrames(1, "1.7.1").inStudy("1.7").inSeries("1.7.7"));
-    correct(DCM_PatientName, "Right^Name", "1.2", "1.7");
-    const QByteArray moved = QByteArray(kObject).replace("studyUID=1.2", "studyUID=1.7");
-    Http::Response response = ask(moved + "contentType=application/dicom");
-    EXPECT_EQ(nameIn(bodyOf(response)), "Right^Name");
-    EXPECT_EQ(ask(moved + "contentType=image/jpeg").status, 200);
-    EXPECT_EQ(object("contentType=application/dicom").status, 404);
-    EXPECT_EQ(object("contentType=image/jpeg").status, 404);
-}
-
-TEST_F(UriTest, NeverShowsAnotherImage)
-{
-    add("a.dcm", anImageWithFrames(1));
-    const QByteArray forms[] = {"contentType=application/dicom", "contentType=image/jpeg",
-                                "contentType=application/dicom&transferSyntax=1.2.840.10008.1.2.5"};
-    write("a.dcm", anImageWithFrames(1, "1.2.3.2"));
-    for (const QByteArray& form : forms)
-        EXPECT_EQ(object(form).status, 410) << form.constData();
-    QFile::remove(path("a.dcm"));
-    for (const QByteArray& form : forms)
-        EXPECT_EQ(object(form).status, 410) << form.constData();
 }
 
 }  // namespace

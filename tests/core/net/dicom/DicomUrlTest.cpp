@@ -48,8 +48,7 @@ class DicomUrl : public testing::Test
 protected:
     DicomUrl()
     {
-        DcmFileFormat format(&image.dataset());
-        format.saveFile(path().c_str(), EXS_LittleEndianExplicit);
+        image.save(QString::fromStdString(path()));
         bytes = fileContent(QString::fromStdString(path()));
     }
     ~DicomUrl() override

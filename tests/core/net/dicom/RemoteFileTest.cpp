@@ -6,8 +6,6 @@
 #include "support/FileContent.h"
 #include "support/ObjectServer.h"
 
-#include <QTemporaryDir>
-
 #include <gmock/gmock.h>
 
 #include <atomic>
@@ -171,14 +169,11 @@ TEST(RemoteFile, IsKnownAgainByWhatTheServerSaysOfItsVersion)
 /// A file whose long values are asked for later.
 TEST(RemoteDicom, LeavesLongValuesWhereTheyAreAndFetchesThemFromTheSameObjectOnly)
 {
-    const QTemporaryDir folder;
-    const QString path = folder.filePath(QStringLiteral("a"));
-    DcmFileFormat saved(
-        &anImage().withLong(DCM_TextValue, 300'000).words(std::vector<Uint16>(500'000, 7)).dataset());
-    ASSERT_TRUE(saved.saveFile(path.toUtf8().constData(), EXS_LittleEndianExplicit).good());
+    const QByteArray saved =
+        anImage().withLong(DCM_TextValue, 300'000).words(std::vector<Uint16>(500'000, 7)).file();
     std::atomic<bool> isSpoiled{false};
     std::atomic<qint64> sent{0};
-    const ObjectServer server(fileContent(path), [&](ObjectServer::Answer& answer) {
+    const ObjectServer server(saved, [&](ObjectServer::Answer& answer) {
         sent += answer.body.size();
         if (isSpoiled)
             answer.entityTag = "\"v2\"";

@@ -33,7 +33,7 @@ protected:
         const QByteArray series = study + QByteArray(".9");
         store(sop, anImage(sop)
                        .inStudy(study)
-                       .inSeries(series.constData())
+                       .inSeries(series)
                        .with(DCM_PatientName, name)
                        .with(DCM_Modality, "CT"));
     }
@@ -76,20 +76,6 @@ protected:
             changes << each.toObject().value(QLatin1String("change")).toString() + QLatin1Char(' ') +
                            each.toObject().value(QLatin1String("study")).toString();
         return changes.join(QLatin1String(", ")).toStdString();
-    }
-
-    /// Gives an attribute of an image a new value; with `oldStudy` the image comes from there.
-    void correct(const char* study, const char* image, const char* oldStudy, const char* key,
-                 const char* value)
-    {
-        QFile job(path("job.xml"));
-        ASSERT_TRUE(job.open(QIODevice::WriteOnly));
-        job.write("<Job><Timestamp>20240131120000</Timestamp><Substitutions OldSUID='" +
-                  QByteArray(oldStudy) + "'><Tag " + key + "><Value>" + value +
-                  "</Value></Tag></Substitutions></Job>");
-        job.close();
-        kdd({QStringLiteral("qa"), path("job.xml"), QStringLiteral("--study"), QString::fromLatin1(study),
-             QStringLiteral("--image"), QString::fromLatin1(image)});
     }
 
     QString tagFile(const char* study) const { return TagFile::cacheFilePathForStudy(study); }
@@ -232,9 +218,7 @@ TEST_P(SearchOperations, TheFeedSkipsNothingOfWhatProcessesDoAtOnce)
         for (int k = 0; k < 4; ++k) {
             const QByteArray study = "5." + QByteArray::number(i) + '.' + QByteArray::number(k);
             store((QByteArray::number(i) + '/' + study).constData(),
-                  anImage((study + ".1.1").constData())
-                      .inStudy(study.constData())
-                      .inSeries((study + ".1").constData()));
+                  anImage(study + ".1.1").inStudy(study).inSeries(study + ".1"));
         }
     }
     std::atomic<int> writing{kWriters};

@@ -1,7 +1,6 @@
 #include "SearchedArchive.h"
 #include "support/RealFiles.h"
 
-#include <QDateTime>
 #include <QFileInfo>
 #include <QRegularExpression>
 
@@ -216,12 +215,8 @@ TEST_P(SearchOracle, AgreesOnRandomQuestionsOverRealFiles)
         QDir().mkpath(copy);
         ASSERT_TRUE(QFile::copy(file, copy + QLatin1Char('/') + QFileInfo(file).fileName()));
     }
-    QProcess tool;
-    tool.start(QStringLiteral(KDD_BINARY),
-               {QStringLiteral("--store"), path("store"), QStringLiteral("--database"),
-                QString::fromUtf8(address()), QStringLiteral("--quiet"), QStringLiteral("add"),
-                path("images")});
-    ASSERT_TRUE(tool.waitForFinished(120000));  // what is no DICOM file there makes it end with 1
+    runTool(path("store"), address(),
+            {QStringLiteral("add"), path("images")});  // what is no DICOM file there makes it end with 1
     // Only what was taken in, from the files that are shown.
     QMap<QString, QString> shown;
     for (const QJsonValue& each : list("studies?limit=1000")) {

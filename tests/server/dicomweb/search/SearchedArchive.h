@@ -1,20 +1,13 @@
 #pragma once
 
+#include "server/ServerFixture.h"
 #include "server/dicomweb/search/ChangeFeed.h"
 #include "server/dicomweb/search/SearchResource.h"
-#include "support/DatasetBuilder.h"
+#include "support/FileContent.h"
 #include "support/PostgresServer.h"
 
-#include <QDir>
-#include <QJsonArray>
-#include <QJsonDocument>
-#include <QJsonObject>
-#include <QProcess>
 #include <QTemporaryDir>
-#include <QUrl>
 
-#include <gtest/gtest.h>
-#include <kddlib/Kxg.h>
 #include <kddlib/TagFile.h>
 
 namespace Kdd::DicomWeb
@@ -45,24 +38,28 @@ protected:
     /// Writes an image; images of one study are told apart by their file names.
     void store(const char* name, const DatasetBuilder& image) const
     {
-        DcmFileFormat file(const_cast<DcmDataset*>(&image.build()));
-        const QByteArray target = path("images").toLocal8Bit() + '/' + name;
-        ASSERT_TRUE(file.saveFile(target.constData(), EXS_LittleEndianExplicit).good());
+        image.save(path("images/") + QString::fromUtf8(name));
     }
 
     /// Runs the tool, which has to succeed.
     void kdd(const QStringList& arguments) const
     {
-        QProcess process;
-        process.start(QStringLiteral(KDD_BINARY),
-                      QStringList{QStringLiteral("--store"), path("store"), QStringLiteral("--database"),
-                                  QString::fromUtf8(mAddress), QStringLiteral("--quiet")} +
-                          arguments);
-        ASSERT_TRUE(process.waitForFinished(120000));
-        ASSERT_EQ(process.exitCode(), 0) << process.readAllStandardError().toStdString();
+        EXPECT_EQ(runTool(path("store"), mAddress, arguments), 0)
+            << arguments.join(QLatin1Char(' ')).toStdString();
     }
     void kdd(const char* arguments) const { kdd(QString::fromLatin1(arguments).split(QLatin1Char(' '))); }
     void add() const { kdd({QStringLiteral("add"), path("images")}); }
+
+    /// Gives an attribute of an image a new value; with `oldStudy` the image comes from there.
+    void correct(const char* study, const char* image, const char* oldStudy, const char* key,
+                 const char* value) const
+    {
+        putFile(path("job.xml"), "<Job><Timestamp>20240131120000</Timestamp><Substitutions OldSUID='" +
+                                     QByteArray(oldStudy) + "'><Tag " + key + "><Value>" + value +
+                                     "</Value></Tag></Substitutions></Job>");
+        kdd({QStringLiteral("qa"), path("job.xml"), QStringLiteral("--study"), QString::fromLatin1(study),
+             QStringLiteral("--image"), QString::fromLatin1(image)});
+    }
 
     /// "studies?PatientName=*x*", as it stands in an address.
     Http::Response get(const char* target, const QVector<Http::Field>& headers = {})

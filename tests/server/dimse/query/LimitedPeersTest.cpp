@@ -36,26 +36,33 @@ const struct
     const char* seen;  // by who is limited
 } kWishes[] = {
     {"STUDY", "StudyInstanceUID=1\\2", "1.1.1 1.1.2 1.2.1 2.1.1", "1.1.1 1.1.2 1.2.1"},
+    {"STUDY", "StudyInstanceUID=1", "1.1.1 1.1.2 1.2.1", "1.1.1 1.1.2 1.2.1"},
     {"STUDY", "StudyInstanceUID=2", "2.1.1", ""},
+    {"STUDY", "StudyInstanceUID=9", "", ""},
+    {"SERIES", "StudyInstanceUID=1|SeriesInstanceUID=1.1", "1.1.1 1.1.2", "1.1.1 1.1.2"},
     {"SERIES", "StudyInstanceUID=2|SeriesInstanceUID=2.1", "2.1.1", ""},
     {"SERIES", "SeriesInstanceUID=1.1\\2.1", "1.1.1 1.1.2 2.1.1", "1.1.1 1.1.2"},
     {"IMAGE", "StudyInstanceUID=2|SeriesInstanceUID=2.1|SOPInstanceUID=2.1.1", "2.1.1", ""},
     {"IMAGE", "SOPInstanceUID=1.1.2\\2.1.1", "1.1.2 2.1.1", "1.1.2"},
-    {"STUDY", "PatientID=P2|StudyInstanceUID=2", "2.1.1", ""},
+    {"STUDY", "PatientID=P2|StudyInstanceUID=1\\2", "2.1.1", ""},
 };
 
-TEST_P(LimitedPeers, GetNothingOfStudiesThatTheyMayNotSee)
+TEST_P(LimitedPeers, GetWhatIsNamedOnEveryLevelButNothingThatTheyMayNotSee)
 {
     for (const auto& each : kWishes) {
         const QStringList keys = onLevel(each.level, keysOf(each.keys));
         get(keys);
-        EXPECT_EQ(answered(DCM_SOPInstanceUID), each.all) << each.keys;
+        EXPECT_EQ(answered(DCM_SOPInstanceUID), each.all) << "C-GET " << each.keys;
+        move(keys);
+        EXPECT_EQ(answered(DCM_SOPInstanceUID), each.all) << "C-MOVE " << each.keys;
         const std::string got = get(keys, mLimited);
         EXPECT_EQ(answered(DCM_SOPInstanceUID), each.seen) << "C-GET " << each.keys << '\n' << got;
         const std::string moved = move(keys, mLimited);
         EXPECT_EQ(answered(DCM_SOPInstanceUID), each.seen) << "C-MOVE " << each.keys << '\n' << moved;
         EXPECT_THAT(moved, HasSubstr("Received Final Move Response (Success)")) << each.keys;
     }
+    run("getscu", {QStringLiteral("-P")}, onLevel("PATIENT", keysOf("PatientID=P1")));
+    EXPECT_EQ(answered(DCM_SOPInstanceUID), "1.1.1 1.1.2 1.2.1");
 }
 
 TEST_P(LimitedPeers, FindNothingOfStudiesThatTheyMayNotSee)

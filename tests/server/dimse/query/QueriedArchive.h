@@ -1,18 +1,9 @@
 #pragma once
 
-#include "server/Server.h"
+#include "server/ServerFixture.h"
 #include "server/dicomweb/search/SearchedArchive.h"
-#include "server/http/Client.h"
+#include "server/dimse/RawCaller.h"
 #include "support/FileContent.h"
-
-#include <QtEndian>
-
-#include <kddlib/DicomFileReader.h>
-#include <netinet/in.h>
-#include <sys/socket.h>
-#include <unistd.h>
-
-#include <utility>
 
 namespace Kdd
 {
@@ -25,13 +16,8 @@ protected:
     {
         SearchedArchive::SetUp();
         Kxg::SetDatabaseServer(address());
-        mSettings.http.address = {"127.0.0.1", 0};
-        mSettings.objects.emplace();
-        mSettings.objects->folder = path("objects").toUtf8();
-        mSettings.objects->freeBytes = 0;
-        mSettings.dimse.emplace();
-        mSettings.dimse->address = {"127.0.0.1", 0};
-        mSettings.dimse->rules = Dimse::AssociationRules::open();
+        takeObjects(mSettings, path("objects"));
+        takeAssociations(mSettings);
         mSelf = freePort();
         mSettings.dimse->rules.peers.insert("SELF", {{}, "127.0.0.1", mSelf, false, Dimse::kAllRights});
         mSettings.dimse->rules.peers.insert("NOBODY",
@@ -39,46 +25,13 @@ protected:
         mSettings.dimse->rules.peers.insert("UNCALLED", {{}, {}, 0, false, Dimse::kAllRights});
     }
 
-    /// One that nobody listens on; a moment later somebody may.
-    static quint16 freePort()
-    {
-        sockaddr_in at = {};
-        socklen_t size = sizeof at;
-        at.sin_family = AF_INET;
-        at.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-        const int socket = ::socket(AF_INET, SOCK_STREAM, 0);
-        EXPECT_EQ(::bind(socket, reinterpret_cast<sockaddr*>(&at), size), 0);
-        EXPECT_EQ(::getsockname(socket, reinterpret_cast<sockaddr*>(&at), &size), 0);
-        ::close(socket);
-        return ntohs(at.sin_port);
-    }
-
     void start()
     {
-        Result result;
         mServer.reset();
-        mServer = Server::make(mSettings, result);
-        ASSERT_NE(mServer, nullptr) << result.text().toStdString();
-        ASSERT_TRUE(mServer->start().good());
+        mServer = started(mSettings);
     }
 
-    quint16 port() const
-    {
-        const QByteArray dicom = mServer->dimseAddress();
-        return dicom.mid(dicom.lastIndexOf(':') + 1).toUShort();
-    }
-
-    static bool isListening(quint16 port)
-    {
-        sockaddr_in at = {};
-        at.sin_family = AF_INET;
-        at.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-        at.sin_port = htons(port);
-        const int socket = ::socket(AF_INET, SOCK_STREAM, 0);
-        const bool isThere = ::connect(socket, reinterpret_cast<sockaddr*>(&at), sizeof at) == 0;
-        ::close(socket);
-        return isThere;
-    }
+    quint16 port() const { return dicomPort(*mServer); }
 
     /// Two images of one series and one of another, of one patient, and one of another patient.
     void fill()
@@ -113,13 +66,11 @@ protected:
     {
         mAnswers = path("answers") + QString::number(++mRuns);
         QDir().mkpath(mAnswers);
-        const QByteArray dicom = mServer->dimseAddress();
         QStringList arguments = {QStringLiteral("-v"), QStringLiteral("-od"), mAnswers};
         arguments += options;
         for (const QString& key : keys)
             arguments << QStringLiteral("-k") << key;
-        arguments << QStringLiteral("127.0.0.1")
-                  << QString::fromLatin1(dicom.mid(dicom.lastIndexOf(':') + 1));
+        arguments << QStringLiteral("127.0.0.1") << QString::number(port());
         arguments += files;
         auto process = std::make_unique<QProcess>();
         process->setWorkingDirectory(mAnswers);
@@ -159,18 +110,9 @@ protected:
     /// The dataset of an object as it is retrieved over HTTP, as stored.
     QByteArray retrieved(const char* path) const
     {
-        Client client(mServer->address());
-        client.get(QByteArray("/dicom-web/") + path, "Accept: application/dicom; transfer-syntax=*\r\n");
-        return datasetOf(client.reply().body);
-    }
-
-    /// What stands behind the meta header.
-    static QByteArray datasetOf(const QByteArray& file)
-    {
-        constexpr int kToLength = 140;
-        return file.size() < kToLength + 4
-                   ? "none: " + file
-                   : file.mid(kToLength + 4 + qFromLittleEndian<qint32>(file.constData() + kToLength));
+        return datasetOf(ask(*mServer, "GET", QByteArray("/dicom-web/") + path,
+                             "Accept: application/dicom; transfer-syntax=*\r\n")
+                             .body);
     }
 
     /// The datasets of the objects that the last run left, as they came.
@@ -212,7 +154,8 @@ protected:
                                                                              : "-";
     }
 
-    ServerSettings mSettings;
+    LogCapture mLog;
+    ServerSettings mSettings = onFreePort();
     quint16 mSelf = 0;
     QString mAnswers;
     std::unique_ptr<Server> mServer;

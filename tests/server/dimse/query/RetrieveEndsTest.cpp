@@ -20,8 +20,6 @@ protected:
     {
         mDestination.kill();
         mDestination.waitForFinished(-1);
-        // It logs until it ends, and the capture of the log ends first.
-        mServer.reset();
     }
 
     /// DCMTK's storescp, with options of its own.
@@ -63,7 +61,6 @@ protected:
         return moving;
     }
 
-    LogCapture mLog;
     quint16 mThere = 0;
     QProcess mDestination;
 };
