@@ -1,7 +1,10 @@
 #include "QueriedArchive.h"
 #include "server/dimse/QueryIdentifier.h"
+#include "support/RealFiles.h"
 
 #include <gmock/gmock.h>
+
+#include <random>
 
 using namespace Kdd;
 using testing::HasSubstr;
@@ -218,6 +221,90 @@ TEST_P(FindTest, EndsWhenItIsCancelled)
             onLevel("IMAGE", {QStringLiteral("StudyInstanceUID=7"), QStringLiteral("SOPInstanceUID")}));
     EXPECT_THAT(said, HasSubstr("Cancel: MatchingTerminatedDueToCancelRequest"));
     EXPECT_LT(answers().size(), 300U);
+}
+
+class FindOracle : public FindTest
+{
+};
+
+INSTANTIATE_TEST_SUITE_P(Engines, FindOracle,
+                         testing::Values(DicomWeb::Engine::Sqlite, DicomWeb::Engine::Postgres),
+                         DicomWeb::engineName);
+
+struct SearchedLevel
+{
+    const char* level;
+    const char* resource;
+    const char* uid;
+    DcmTagKey key;
+};
+
+const SearchedLevel kSearched[] = {{"STUDY", "studies", "0020000D", DCM_StudyInstanceUID},
+                                   {"SERIES", "series", "0020000E", DCM_SeriesInstanceUID},
+                                   {"IMAGE", "instances", "00080018", DCM_SOPInstanceUID}};
+
+/// What is asked for of a value, in words that mean the same to both.
+QString question(const QString& value, std::mt19937& random)
+{
+    const int cut = 1 + static_cast<int>(random() % static_cast<unsigned>(value.size()));
+    switch (random() % 3) {
+    case 0:
+        return value;
+    case 1:
+        return value.left(cut) + QLatin1Char('*');
+    default:
+        return QLatin1Char('*') + value.mid(value.size() - cut);
+    }
+}
+
+TEST_P(FindOracle, AgreesWithSearchesOverHttp)
+{
+    if (realFilesFolder().isEmpty())
+        GTEST_SKIP() << "KDD_TEST_DATA is not set";
+    for (const char* folder : {"charsets", "modalities", "series/geometry"}) {
+        for (const QString& file : realFiles(folder))
+            QFile::copy(file, path("images") + QLatin1Char('/') +
+                                  QFileInfo(file).path().section(QLatin1Char('/'), -1) + QLatin1Char('_') +
+                                  QFileInfo(file).fileName());
+    }
+    // Some of the files are none that are taken.
+    ASSERT_EQ(runTool(path("store"), address(), {QStringLiteral("add"), path("images")}), 1);
+    start();
+    std::mt19937 random(7);
+    const char* const keys[] = {"PatientName", "PatientID", "AccessionNumber", "StudyDescription", "StudyID"};
+    int found = 0;
+    for (int i = 0; i < 60; ++i) {
+        const SearchedLevel& level = kSearched[random() % 3];
+        const char* const key = keys[random() % 5];
+        const QJsonArray all = list("studies?limit=1000&includefield=StudyDescription");
+        const QString value =
+            textOf(all[static_cast<int>(random() % static_cast<unsigned>(all.size()))].toObject(),
+                   key == keys[0]   ? "00100010"
+                   : key == keys[1] ? "00100020"
+                   : key == keys[2] ? "00080050"
+                   : key == keys[3] ? "00081030"
+                                    : "00200010");
+        const QString asked = value.isEmpty() ? value : question(value, random);
+        // Findscu takes some letters for its own, and a list is none over HTTP.
+        if (asked.isEmpty() || asked.contains(QRegExp(QStringLiteral("[\\\\\"=,]"))) ||
+            asked.trimmed() != asked)
+            continue;
+        const QByteArray target =
+            QByteArray(level.resource) + "?limit=10000&" + key + '=' + asked.toUtf8().toPercentEncoding();
+        QStringList expected;
+        for (const QJsonValue& each : list(target.constData()))
+            expected << textOf(each.toObject(), level.uid);
+        expected.sort();
+        const std::string said = find(
+            onLevel(level.level,
+                    {QLatin1String(key) + QLatin1Char('=') + asked,
+                     QStringLiteral("SpecificCharacterSet=ISO_IR 192"), QStringLiteral("StudyInstanceUID"),
+                     QStringLiteral("SeriesInstanceUID"), QStringLiteral("SOPInstanceUID")}));
+        EXPECT_EQ(answered(level.key), expected.join(QLatin1Char(' ')).toStdString())
+            << target.toStdString() << said;
+        found += expected.size();
+    }
+    EXPECT_GT(found, 50);
 }
 
 }  // namespace
