@@ -65,8 +65,8 @@ public:
     struct Attempt
     {
         Result result;
-        bool reachedFiles =
-            false;  ///< failed with the study's files: else others work on it, or the database failed
+        /// It failed with the files of the study. Else others work on it, or the database failed.
+        bool reachedFiles = false;
     };
 
     /// Brings into the study's tag file what has arrived by now; nothing where nothing has. Waits up to `patienceMs` [ms]

@@ -27,8 +27,8 @@ public:
 
     enum class Form { Json, Xml };
 
-    /// 200: all are stored; 202: some; 409: none; 503: none, for want of room or because database or disk failed. `badStatus`, not 0, is that of a request that
-    /// broke off, where nothing was stored.
+    /// 200: all are stored; 202: some; 409: none; 503: none, for want of room or because the database or the disk failed.
+    /// `badStatus`, not 0, is that of a request that broke off, where nothing was stored.
     Http::Response response(Form form, int badStatus) const;
 
 private:
