@@ -338,14 +338,25 @@ class Sequence:
 
     def do_both(self, *words):
         at = words.index("+")
-        made = [self.command(words[:at]), self.command(words[at + 1:])]
+        both = words[:at], words[at + 1:]
+        made = [self.command(each) for each in both]
         if None in made:
             return "passed over"
+        late = [self.looked_early(each) for each in both]
         processes = [self.site.begin(*each[0]) for each in made]
         said = [process.communicate(timeout=120)[1].decode() for process in processes]
         if any(process.returncode not in (0, 1) for process in processes):
             raise Difference("one of two ends otherwise: " + " ".join(said))
-        return self.heal([[made[0][1], made[1][1]], [made[1][1], made[0][1]]])
+        orders = [[made[0][1], made[1][1]], [made[1][1], made[0][1]]]
+        orders += [[made[1 - number][1], late[number]] for number in (0, 1) if late[number]]
+        return self.heal(orders)
+
+    def looked_early(self, words):
+        """What a scan does that had looked for changed files before the other command did anything, and took them in after it."""
+        if words[0] not in ("add", "index"):
+            return None
+        paths = self.model.changed_below(self.folder(words[1]))
+        return lambda model: model.take(paths)
 
     def do_kill(self, after, *words):
         """[ms] after it began. Then it is repeated."""
