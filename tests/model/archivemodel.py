@@ -230,14 +230,11 @@ class Archive:
     def build_study(self, study):
         """What cannot be read, or is another image now, stays as the tag file had it; then the study goes on waiting."""
         wanted, content, is_whole = self.listed_images(study), {}, True
-        for key, (path, known) in wanted.items():
+        for key, (path, known) in sorted(wanted.items()):
             file = self.disk.get(path)
-            # What was registered without UID has none that it could contradict.
-            if file and file[:2] == known[:2] and known.sop in ("", file.sop):
-                # Two that were registered as others may be one image by now.
-                there = content.get(key_of(path, file))
-                if there is None or self.registered[there.path].order < self.registered[path].order:
-                    content[key_of(path, file)] = Image(path, self.corrected(path, file))
+            # What was registered without UID has none that it could contradict, but may not take the place of another one.
+            if file and file[:2] == known[:2] and (file.sop == known.sop if known.sop else file.sop not in wanted):
+                content[key_of(path, file)] = Image(path, self.corrected(path, file))
                 continue
             is_whole = False
             if key in self.shown.get(study, {}):

@@ -105,22 +105,27 @@ Result StudySources::queryImages()
     QMap<QByteArray, std::shared_ptr<Kxg::SeriesInfo>> series;
     Result result = Kxg::GetSeries(corrections.studyUID(), series);
     mListed.clear();
+    mKeys.clear();
     for (const std::shared_ptr<Kxg::SeriesInfo>& info : qAsConst(series)) {
         // An image without UID is known by its path, here as in the tree.
-        for (const Kxg::ImageFile& file : info->images)
-            mListed.insert(file.path, {info->seriesInstanceUID,
-                                       file.sopInstanceUID.isEmpty() ? file.path : file.sopInstanceUID});
+        for (const Kxg::ImageFile& file : info->images) {
+            const QByteArray key = file.sopInstanceUID.isEmpty() ? file.path : file.sopInstanceUID;
+            mListed.insert(file.path, {info->seriesInstanceUID, key});
+            mKeys.insert(key);
+        }
     }
     return result;
 }
 
-/// Of a file that was registered without SOP Instance UID only the series was said.
+/// Of a file that was registered without SOP Instance UID only the series was said; but by now it may have one that another
+/// file was registered with, whose place it must not take.
 bool StudySources::isListed(const TagMap& image, const QByteArray& path) const
 {
     const auto listed = mListed.constFind(path);
     if (listed == mListed.cend())
         return true;
-    return (listed->key == path || image.uid(TagMap::ImageLevel) == listed->key) &&
+    const QByteArray sopUID = image.uid(TagMap::ImageLevel);
+    return (listed->key == path ? !mKeys.contains(sopUID) : sopUID == listed->key) &&
            (listed->seriesUID.isEmpty() || image.uid(TagMap::SeriesLevel) == listed->seriesUID);
 }
 

@@ -129,6 +129,7 @@ private:
     bool readFormer();
 
     QHash<QByteArray, Listed> mListed;  // by path
+    QSet<QByteArray> mKeys;             // of the images that are listed
 };
 
 }  // namespace Kdd

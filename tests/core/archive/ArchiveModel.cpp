@@ -212,17 +212,13 @@ bool ArchiveModel::build(const std::string& study)
         const std::string& path = image.second.path;
         const auto file = mDisk.find(path);
         const ModelFile& known = image.second.shows;
-        // What was registered without UID has none that it could contradict.
-        const bool isThat = file != mDisk.end() && file->second.study == known.study &&
-                            file->second.series == known.series &&
-                            (known.sop.empty() || file->second.sop == known.sop);
+        // What was registered without UID has none that it could contradict, but may not take the place of another one.
+        const bool isThat =
+            file != mDisk.end() && file->second.study == known.study && file->second.series == known.series &&
+            (known.sop.empty() ? wanted.count(file->second.sop) == 0 : file->second.sop == known.sop);
         if (isThat) {
             const std::string key = keyOf(path, file->second);
-            // Two that were registered as others may be one image by now.
-            const auto there = content.find(key);
-            if (there == content.end() ||
-                mRegistered.at(there->second.path).number < mRegistered.at(path).number)
-                content[key] = {path, edited(key, file->second)};
+            content[key] = {path, edited(key, file->second)};
             continue;
         }
         isWhole = false;

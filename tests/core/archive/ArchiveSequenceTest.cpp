@@ -267,6 +267,20 @@ TEST_F(FixedSequence, AFileWithoutImageUidIsNotTakenFromAnotherSeriesThanItWasRe
     expectHealed();
 }
 
+TEST_F(FixedSequence, AFileWithoutImageUidDoesNotTakeThePlaceOfAnotherImage)
+{
+    for (const char* other : {"8", "99"}) {
+        at("9", {"1.1", "1.1.7", "", "Doe^1", "1"});
+        at(other, {"1.1", "1.1.7", "9.1", "Doe^2", "2"});
+        add(root());
+        at("9", {"1.1", "1.1.7", "9.1", "Doe^3", "3"});
+        buildAll(true);
+        expectAgreement();
+        add(root());
+        expectHealed();
+    }
+}
+
 TEST_F(FixedSequence, ASyncFollowsAFileIntoASeriesThatIsNotBuilt)
 {
     at("9", {"1.1", "1.1.7", "9.1", "Doe^1", "1"});

@@ -1,7 +1,6 @@
 #include "server/dicomweb/store/ArrivalService.h"
 
 #include "support/DatasetBuilder.h"
-#include "support/FileContent.h"
 #include "support/LogCapture.h"
 #include "support/Setting.h"
 #include "support/TemporaryStore.h"
@@ -43,11 +42,7 @@ protected:
 
     QByteArray store(ArrivalService& service, const char* sopUID) const
     {
-        const QString path = mStore.filePath("sent.dcm");
-        DcmDataset copy(anImage(sopUID).build());
-        DcmFileFormat format(&copy);
-        EXPECT_TRUE(format.saveFile(path.toUtf8().constData(), EXS_LittleEndianExplicit).good());
-        const QByteArray bytes = fileContent(path);
+        const QByteArray bytes = anImage(sopUID).file();
         std::vector<std::unique_ptr<ObjectArrival>> arrivals;
         arrivals.push_back(service.store().begin());
         arrivals[0]->take(bytes.constData(), bytes.size());
@@ -64,7 +59,6 @@ protected:
     std::unique_ptr<Kxg::StudyClaim> claim() const
     {
         std::unique_ptr<Kxg::StudyClaim> claimed;
-        Result result;
         EXPECT_TRUE(mCatalogue->claim("1.2", 0, claimed).good());
         return claimed;
     }
