@@ -170,7 +170,8 @@ protected:
 class KDD_EXPORT Catalogue
 {
 public:
-    /// Makes the database or brings its schema up to date. A schema newer than this program is refused.
+    /// Makes the database or brings its schema up to date. A schema newer than this program is refused. One that this
+    /// process had open is not made a second time: its absence is a failure then.
     static std::unique_ptr<Catalogue> open(const QByteArray& address, Kdd::Result& result);
 
     /// The same, but one that does not exist is a failure. An SQLite database that this process may not change can be

@@ -8,6 +8,8 @@
 #include "platform/volumefile/VolumeFileName.h"
 
 #include <algorithm>
+#include <mutex>
+#include <set>
 #include <utility>
 
 namespace Kxg
@@ -54,14 +56,46 @@ StudySummary summaryOf(const SqlRows& rows)
     return study;
 }
 
+/// The databases that this process had open. One of them that is gone is in other hands, being moved or restored, or lies
+/// on a disk that fell away: an empty one in its place would tell that there are no studies, and take what comes.
+class FormerDatabases
+{
+public:
+    static bool has(const DatabaseAddress& address)
+    {
+        const std::lock_guard<std::mutex> lock(sMutex);
+        return all().count(address.shown) != 0;
+    }
+    static void add(const DatabaseAddress& address)
+    {
+        const std::lock_guard<std::mutex> lock(sMutex);
+        all().insert(address.shown);
+    }
+
+private:
+    static std::set<QString>& all()
+    {
+        static std::set<QString> sAll;
+        return sAll;
+    }
+    static std::mutex sMutex;
+};
+
+std::mutex FormerDatabases::sMutex;
+
 std::unique_ptr<Catalogue> openWith(const QByteArray& address, SqlConnection::IfAbsent ifAbsent,
                                     Kdd::Result& result)
 {
     std::unique_ptr<Catalogue> catalogue;
     DatabaseAddress parsed;
     result = DatabaseAddress::parse(address, parsed);
+    if (result.bad())
+        return nullptr;
+    if (FormerDatabases::has(parsed))
+        ifAbsent = SqlConnection::IfAbsent::Fail;
+    result = attempt(parsed, [&] { catalogue = std::make_unique<SqlCatalogue>(parsed, ifAbsent); });
     if (result.good())
-        result = attempt(parsed, [&] { catalogue = std::make_unique<SqlCatalogue>(parsed, ifAbsent); });
+        FormerDatabases::add(parsed);
     return catalogue;
 }
 

@@ -1,6 +1,8 @@
 #include "DatabaseFixture.h"
 
+#include <QDir>
 #include <QFile>
+#include <QFileInfo>
 
 #include <cstring>
 
@@ -73,6 +75,23 @@ TEST_P(DatabaseFailureTest, TablesThatAreMissingOrOfANewerProgramAreRefused)
     const std::string newer = ": its tables have version 99, this program works with version 9";
     for (const std::string& text : {opening(address()), asking()})
         EXPECT_NE(text.find(newer), std::string::npos) << text;
+}
+
+TEST_P(DatabaseFailureTest, WhatThisProcessHadOpenIsNotMadeAnewEmpty)
+{
+    add({dicom("/d/a", "1", "1.1")});
+    if (GetParam() == Engine::Sqlite) {
+        const QString file = QString::fromUtf8(address().mid(int(std::strlen("sqlite:"))));
+        ASSERT_TRUE(QDir(QFileInfo(file).path()).removeRecursively());
+        EXPECT_NE(opening(address()).find("No such file"), std::string::npos) << opening(address());
+        EXPECT_FALSE(QFileInfo::exists(QFileInfo(file).path()));
+    } else {
+        execute("DROP SCHEMA public CASCADE");
+        execute("CREATE SCHEMA public");
+        EXPECT_NE(opening(address()).find("it has no tables"), std::string::npos) << opening(address());
+    }
+    QMap<QByteArray, qint64> requests;
+    EXPECT_TRUE(catalogue().registerFiles(FileRecords{{dicom("/d/b", "2", "2.1")}, {}, {}}, requests).bad());
 }
 
 TEST_P(DatabaseFailureTest, AFailedStatementTellsWhereAndWhyAndHarmsNothing)
