@@ -3,6 +3,7 @@
 
 #include <gtest/gtest.h>
 
+#include <cstdio>
 #include <cstdlib>
 #include <numeric>
 
@@ -380,6 +381,7 @@ TEST(ArchiveSequence, AgreesWithTheModelOnBothEngines)
 {
     const unsigned first = setting("KDD_ARCHIVE_SEED", 1);
     const unsigned steps = setting("KDD_ARCHIVE_STEPS", 1200);
+    std::printf("%u steps on SQLite from seed %u, and %u on PostgreSQL\n", steps, first, steps / 10);
     expectAgreement(first, steps, [] { return QByteArray(); });
     expectAgreement(first + 100000, steps / 10, newPostgresDatabase);
 }
