@@ -180,10 +180,14 @@ class Archive:
         self.take([path_of(number)])
         return True
 
+    def waiting_with_objects(self, folder):
+        """The studies that a server with this folder looks after when it begins."""
+        return sorted(self.waiting & {self.place(path, known.file)[0] for path, known in self.registered.items()
+                                      if path.startswith(folder + "/")})
+
     def look_after(self, folder):
-        """A server that begins completes the studies that wait and have objects in its folder. Whether there were any."""
-        studies = {self.place(path, known.file)[0] for path, known in self.registered.items() if path.startswith(folder + "/")}
-        waiting = sorted(studies & self.waiting)
+        """A server that begins completes them. Whether there were any."""
+        waiting = self.waiting_with_objects(folder)
         for study in waiting:
             self.complete(study, {}, study not in self.changed)
         return bool(waiting)

@@ -37,12 +37,15 @@ class Sequence:
             # A server that took an object looks at its study once more, some moments later, and takes in what waits then.
             self.site.stop()
             self.has_stored = False
+        # So does one that finds a study at its beginning that cannot be completed, though it is removed and comes again.
+        finds_waiting = self.site.server is None and bool(self.model.waiting_with_objects(self.site.objects))
         if getattr(self, "do_" + words[0].replace("-", "_"))(*words[1:]) != "passed over":
             self.count += not is_quiet
             if not is_quiet and self.model.look_after(self.site.objects):
                 self.site.stop()
                 self.site.start()
                 self.is_late = self.has_stored = True
+            self.has_stored |= finds_waiting and self.site.server is not None
             if not is_quiet:
                 compare(self, self.is_late)
             self.note_written()
