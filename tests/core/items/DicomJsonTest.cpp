@@ -77,6 +77,12 @@ const std::array<const char*, 3> kEncoded[] = {
     {{"ISO_IR 144", "\xbb\xee\xda\x63\x65\xdc\xd1\xe3\xe0", "Люкceмбур"}},
     {{"ISO_IR 192", "M\xc3\xbcller", "Müller"}},
     {{"GB18030", "\xcd\xf5^\xd0\xa1\xb6\xab", "王^小东"}},
+    // Halves of characters that look like delimiters.
+    {{"GB18030", "\x81\x5c^\x81\x5e\x81\x30\x84\x36", "乗^乛¥"}},
+    {{"GBK", "\x81\x5c\\\x81\x5e", "乗\",\"乛"}},
+    {{"\\ISO 2022 IR 87", "\x1b$B5\x5cK\x5c\x1b(B^A", "宮本^A"}},
+    {{"ISO_IR 13", "\x83\x5c^\x95\x5c", "ソ^表"}},  // in Shift JIS
+    {{"ISO_IR 138", "\xe0^\xe1", "א^ב"}},
     {{"\\ISO 2022 IR 87", "Yamada^Tarou=\x1b$B;3ED\x1b(B^\x1b$BB@O:\x1b(B", "Yamada^Tarou=山田^太郎"}},
     {{"ISO 2022 IR 13\\ISO 2022 IR 87", "\xd4\xcf\xc0\xde^\xc0\xdb\xb3", "ﾔﾏﾀﾞ^ﾀﾛｳ"}},
     {{"\\ISO 2022 IR 149", "Hong^Gildong=\x1b$)C\xfb\xf3^\x1b$)C\xd1\xce\xd4\xd7", "Hong^Gildong=洪^吉洞"}},
@@ -93,6 +99,9 @@ TEST(DicomJson, DecodesTextsByTheirCharacterSet)
         DatasetBuilder image = anImage().with(DCM_StudyDescription, name);
         if (characterSet != nullptr)
             image.with(DCM_SpecificCharacterSet, characterSet);
+        EXPECT_THAT(jsonOf(image), holds("00081030", shown));
+        // Value by value.
+        image.withItem(DCM_ReferencedImageSequence, anItem().with(DCM_SpecificCharacterSet, "ISO_IR 109"));
         EXPECT_THAT(jsonOf(image), holds("00081030", shown));
     }
 }

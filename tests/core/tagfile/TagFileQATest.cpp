@@ -101,7 +101,7 @@ const std::array<const char*, 3> kTexts[] = {
     {{"ISO 2022 IR 100\\ISO 2022 IR 144", "\xc3\xbc^\xd0\x96", "\xfc^\x1b-L\xb6"}},
     {{"\\ISO 2022 IR 87", "Yamada=\xe5\xb1\xb1", "Yamada=\x1b$B;3\x1b(B"}},
     {{"\\ISO 2022 IR 149", "\xea\xb9\x80", "\x1b$)C\xb1\xe8"}},
-    {{"GB18030", "\xe7\x8e\x8b", "\xcd\xf5"}},
+    {{"GB18030", "\xe7\x8e\x8b^\xe4\xb9\x97", "\xcd\xf5^\x81\x5c"}},
     {{"ISO_IR 999", "\xc3\xbc", nullptr}},
     {{"ISO_IR 999", "a", "a"}},
 };

@@ -76,22 +76,49 @@ bool decodeByDeclaration(const QByteArray& bytes, const QByteArray& characterSet
     return tSelected.isGood && decodeWith("UTF-8", QByteArray::fromStdString(converted), text);
 }
 
+/// Sets with characters of two bytes, the second of which may look like a delimiter. Of those of China one of four bytes
+/// passes for two of two. Shift JIS some write where JIS X 0201 is declared, which has none of the first bytes; whoever
+/// escapes to other sets does not.
+enum class BytePairs { None, Chinese, ShiftJis };
+
+BytePairs bytePairsOf(const QByteArray& bytes, const QByteArray& characterSet)
+{
+    for (const QByteArray& name : characterSet.split('\\')) {
+        const QByteArray trimmed = name.trimmed();
+        if (trimmed == "GB18030" || trimmed == "GBK")
+            return BytePairs::Chinese;
+        if (trimmed.endsWith("IR 13") && !bytes.contains(kEscape))
+            return BytePairs::ShiftJis;
+    }
+    return BytePairs::None;
+}
+
+bool beginsPair(BytePairs pairs, const QByteArray& bytes, int at)
+{
+    const auto first = static_cast<unsigned char>(bytes.at(at));
+    if (pairs == BytePairs::None || first < 0x81 || first > 0xfe)
+        return false;
+    if (at + 1 == bytes.size() || static_cast<unsigned char>(bytes.at(at + 1)) < 0x40)
+        return false;
+    return pairs == BytePairs::Chinese || first <= 0x9f || (first >= 0xe0 && first <= 0xfc);
+}
+
 /// Kanji come behind escape sequences, katakana as single bytes of JIS X 0201.
-bool decodeJapanese(const QByteArray& bytes, const QByteArray& characterSet, QString& text)
+bool decodeJapanese(const QByteArray& bytes, BytePairs pairs, QString& text)
 {
     if (bytes.contains(kEscape) && decodeWith("ISO-2022-JP", bytes, text))
         return true;
-    return characterSet.contains("IR 13") && decodeWith("Shift_JIS", bytes, text);
+    return pairs == BytePairs::ShiftJis && decodeWith("Shift_JIS", bytes, text);
 }
 
 /// What is declared comes first, then what Japanese files write beyond it. UTF-8 comes before Latin-1 because
 /// bytes of another set hardly ever are valid UTF-8, while Latin-1 explains any bytes.
-QString decodePart(const QByteArray& bytes, const QByteArray& characterSet)
+QString decodePart(const QByteArray& bytes, const QByteArray& characterSet, BytePairs pairs)
 {
     QString text;
     if (isText(bytes, characterSet))
         return QString::fromLatin1(bytes);
-    if (decodeByDeclaration(bytes, characterSet, text) || decodeJapanese(bytes, characterSet, text) ||
+    if (decodeByDeclaration(bytes, characterSet, text) || decodeJapanese(bytes, pairs, text) ||
         decodeWith("UTF-8", bytes, text))
         return text;
     return QString::fromLatin1(bytes);
@@ -178,18 +205,21 @@ QString decodeText(const QByteArray& bytes, const QByteArray& characterSet)
     if (isText(bytes, characterSet))
         return QString::fromLatin1(bytes);
     QString text;
+    const BytePairs pairs = bytePairsOf(bytes, characterSet);
     int start = 0;
     bool isTwoByte = false;
     for (int i = 0; i < bytes.size(); ++i) {
         if (bytes.at(i) == kEscape)
             isTwoByte = entersTwoByteSet(bytes, i);
         // Halves of two-byte characters look like delimiters.
-        if (isTwoByte || !isDelimiter(bytes.at(i)))
-            continue;
-        text += decodePart(bytes.mid(start, i - start), characterSet) + QLatin1Char(bytes.at(i));
-        start = i + 1;
+        if (beginsPair(pairs, bytes, i))
+            ++i;
+        else if (!isTwoByte && isDelimiter(bytes.at(i))) {
+            text += decodePart(bytes.mid(start, i - start), characterSet, pairs) + QLatin1Char(bytes.at(i));
+            start = i + 1;
+        }
     }
-    return text + decodePart(bytes.mid(start), characterSet);
+    return text + decodePart(bytes.mid(start), characterSet, pairs);
 }
 
 bool convertToUtf8(DcmItem& dataset)

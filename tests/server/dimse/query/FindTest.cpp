@@ -173,6 +173,29 @@ TEST_P(FindTest, RefusesWhatItCannotUnderstand)
     }
 }
 
+TEST(QueryIdentifier, ReadsValuesInTheCharactersThatItNames)
+{
+    // Bytes of the second and third look like the backslash that parts values.
+    const char* const rows[][3] = {
+        {"ISO_IR 100", "M\xFCller*", "M\xC3\xBCller*"},
+        {"GB18030", "\x81\x5C*", "\xE4\xB9\x97*"},
+        {"\\ISO 2022 IR 87", "\x1B$B5\x5CK\x5C\x1B(B*", "\xE5\xAE\xAE\xE6\x9C\xAC*"},
+    };
+    for (const auto& row : rows) {
+        DcmDataset dataset(anItem()
+                               .with(DCM_SpecificCharacterSet, row[0])
+                               .with(DCM_QueryRetrieveLevel, "STUDY")
+                               .with(DCM_PatientName, row[1])
+                               .build());
+        Dimse::QueryIdentifier identifier;
+        QString reason;
+        EXPECT_TRUE(Dimse::QueryIdentifier::read(dataset, Dimse::QueryRoot::Study, identifier, reason));
+        ASSERT_EQ(identifier.search.conditions.size(), 1U) << row[0];
+        EXPECT_EQ(identifier.search.conditions[0].list, QVector<QString>{QString::fromUtf8(row[2])})
+            << row[0];
+    }
+}
+
 TEST(QueryIdentifier, AsksForNoMoreThanItMay)
 {
     const auto reasonOf = [](const DatasetBuilder& keys) {
