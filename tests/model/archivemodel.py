@@ -354,19 +354,30 @@ class Archive:
         path, file = self.listed_images(study)[key]
         return file.study, key_of(path, file)
 
+    def is_correctable(self, study, key):
+        """What else is done at the same time may have taken the image away."""
+        return key in self.shown.get(study, {}) and key in self.listed_images(study)
+
     def edit(self, study, key, patient):
+        """Whether there is such an image."""
+        if not self.is_correctable(study, key):
+            return False
         shown = self.shown[study][key]
         if shown.shows.patient != patient:
             self.corrections.setdefault(self.origin(study, key), Correction()).patient = patient
             self.shown[study][key] = shown._replace(shows=shown.shows._replace(patient=patient))
             self.marked.add(study)
             self.changed |= {study} & self.waiting
+        return True
 
     def move(self, study, key, to_study, to_series):
-        """To another series, and perhaps study, which replaces the image that stands there under the same UID."""
+        """To another series, and perhaps study, which replaces the image that stands there under the same UID. Whether there is
+        such an image."""
+        if not self.is_correctable(study, key):
+            return False
         shown = self.shown[study][key]
         if (study, shown.shows.series) == (to_study, to_series):
-            return
+            return True
         origin = self.origin(study, key)
         files = [path for path, known in sorted(self.registered.items(), key=lambda each: each[1].order)
                  if (known.file.study, key_of(path, known.file)) == origin]
@@ -389,3 +400,4 @@ class Archive:
             if study != to_study:
                 self.waiting.add(study)
                 self.changed.add(study)
+        return True

@@ -141,7 +141,7 @@ class Sequence:
         job = self.site.job(XML_JOB % ("", "0010", "0010", patient))
         arguments = ["qa", job, "--study", study, "--image", key]
         if model.can_correct(study, key):
-            return arguments, lambda each: each.edit(study, key, patient) is None
+            return arguments, lambda each: each.edit(study, key, patient)
         is_absent = study not in model.shown or (model.is_trusted(study) and key not in model.shown[study] and
                                                  key not in model.listed_images(study))
         return (arguments, lambda each: False) if is_absent and model.is_known(study) else None
@@ -155,7 +155,7 @@ class Sequence:
         old = "" if to_study == study else " OldSUID='%s'" % study
         job = self.site.job(XML_JOB % (old, "0020", "000e", series))
         return (["qa", job, "--study", to_study, "--image", key],
-                lambda each: each.move(study, key, to_study, series) is None)
+                lambda each: each.move(study, key, to_study, series))
 
     def do_command(self, *words):
         made = self.command(words)
