@@ -2,23 +2,22 @@
 
 #include <kddlib/LogFile.h>
 
-#include <vector>
-
 namespace Kdd
 {
 
+bool DatabaseWitness::find(const QByteArray& studyUID, Kxg::TagFileProofs& proofs) const
+{
+    return mDatabase
+        .ask(nullptr, [&](Kxg::StudySearch& search) { return search.tagFileProofs(studyUID, proofs); })
+        .good();
+}
+
 bool DatabaseWitness::isDamaged(const QByteArray& studyUID, const Kxg::TagFileStamp& read)
 {
-    std::vector<Kxg::FoundStudy> found;
-    const Result result = mDatabase.ask(nullptr, [&](Kxg::StudySearch& search) {
-        Kxg::SearchQuery query;
-        query.limit = 1;
-        query.terms.push_back({Kxg::SearchColumn::StudyUID, {studyUID}, {}, {}, {}, {}, {}});
-        return search.studies(query, found);
-    });
-    if (result.bad() || found.empty() || !found[0].isBuilt)
+    Kxg::TagFileProofs proofs;
+    if (!mProves || !find(studyUID, proofs))
         return false;
-    const Kxg::TagFileStamp& written = found[0].tagFile;
+    const Kxg::TagFileStamp& written = proofs.last;
     const bool isUntouched =
         written.modified != 0 && read.fileSize == written.fileSize && read.modified == written.modified;
     if (!isUntouched || read.digest == written.digest)
@@ -27,6 +26,16 @@ bool DatabaseWitness::isDamaged(const QByteArray& studyUID, const Kxg::TagFileSt
         "The tag file of study %s is damaged and not served: its bytes have changed, its size and "
         "time have not",
         studyUID.constData());
+    return true;
+}
+
+/// One that was never built is not there yet; one that is being removed has no images any more.
+bool DatabaseWitness::isMissing(const QByteArray& studyUID)
+{
+    Kxg::TagFileProofs proofs;
+    if (!find(studyUID, proofs) || !proofs.hasImages || proofs.last.digest.isEmpty())
+        return false;
+    LogFile::errorf("The tag file of study %s is missing", studyUID.constData());
     return true;
 }
 

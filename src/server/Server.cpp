@@ -197,8 +197,7 @@ struct Server::Private
         archive.takesByRequest = settings.takesByRequest;
         archive.changes = std::make_unique<DicomWeb::Turns>(settings.changes);
         archive.studies->setArrivals(archive.arrivals.get());
-        if (settings.provesTagFiles)
-            archive.witness = std::make_unique<DatabaseWitness>(archive.database);
+        archive.witness = std::make_unique<DatabaseWitness>(archive.database, settings.provesTagFiles);
         archive.studies->setWitness(archive.witness.get());
         router.add(prefix, std::make_unique<DicomWeb::DicomWebService>(prefix.size(),
                                                                        makeResources(archive, metrics)));

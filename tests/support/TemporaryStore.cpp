@@ -1,6 +1,7 @@
 #include "support/TemporaryStore.h"
 
 #include "kddlib/tagfile/TagFile.h"
+#include "platform/database/Kxg.h"
 
 namespace Kdd
 {
@@ -8,6 +9,11 @@ namespace Kdd
 TemporaryStore::TemporaryStore()
 {
     TagFile::setMetaFolder((mFolder.path() + QStringLiteral("/meta")).toLocal8Bit().constData());
+}
+
+TemporaryStore::~TemporaryStore()
+{
+    Kxg::SetDatabaseServer(QByteArray());
 }
 
 }  // namespace Kdd

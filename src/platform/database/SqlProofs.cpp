@@ -1,4 +1,5 @@
 #include "platform/database/FileKind.h"
+#include "platform/database/ProofRows.h"
 #include "platform/database/SqlCatalogue.h"
 #include "platform/database/StudyContent.h"
 #include "platform/database/StudyLock.h"
@@ -37,30 +38,6 @@ private:
     const std::unique_ptr<StudyLock> mLock;
 };
 
-/// Size and time of the tag file are those of the rows that searches ask, as long as these speak of the same one.
-qint64 readLast(SqlConnection& connection, const QByteArray& studyUID, TagFileProofs& proofs)
-{
-    SqlRows rows = connection.ask(
-        "SELECT study.id, tag_file_size, tag_file_digest,"
-        " EXISTS (SELECT 1 FROM build_request WHERE study_id = study.id AND due <= ?),"
-        " EXISTS (SELECT 1 FROM series JOIN file ON file.series_id = series.id"
-        " WHERE series.study_id = study.id AND file.kind = 1),"
-        " found.digest, found.file_size, found.file_modified"
-        " FROM study LEFT JOIN study_search found ON found.study_id = study.id WHERE study.uid = ?",
-        {presentMs(), textValue(studyUID)});
-    proofs.isThere = rows.next();
-    if (!proofs.isThere)
-        return 0;
-    proofs.last = {rows.number(1), rows.bytes(2)};
-    proofs.isWaiting = rows.truth(3);
-    proofs.hasImages = rows.truth(4);
-    if (rows.bytes(5) == proofs.last.digest) {
-        proofs.last.fileSize = rows.number(6);
-        proofs.last.modified = rows.number(7);
-    }
-    return rows.number(0);
-}
-
 const char kSelectFile[] = "SELECT file.path, file.size, file.modified, file.digest, file.kind FROM ";
 
 FileDigest fileOf(const SqlRows& rows)
@@ -84,7 +61,7 @@ Kdd::Result SqlCatalogue::tagFileProofs(const QByteArray& studyUID, TagFileProof
 {
     return transact(Access::Read, [&] {
         TagFileProofs found;
-        const qint64 studyId = readLast(mConnection, studyUID, found);
+        const qint64 studyId = readTagFileProofs(mConnection, studyUID, found);
         SqlRows rows = mConnection.ask(
             "SELECT size, digest FROM former_tag_file WHERE study_id = ? ORDER BY id DESC", {studyId});
         while (rows.next())

@@ -1,12 +1,14 @@
 #include "platform/database/StudySearch.h"
 
 #include "platform/database/ChangeLog.h"
+#include "platform/database/ProofRows.h"
 #include "platform/database/Schema.h"
 #include "platform/database/SearchRows.h"
 #include "platform/database/SearchSql.h"
 #include "platform/database/SearchWords.h"
 #include "platform/database/SqlConnection.h"
 #include "platform/database/StudyMarks.h"
+#include "platform/database/StudyProofs.h"
 #include "platform/resources/ExResource.h"
 
 #include <QHash>
@@ -278,6 +280,15 @@ Kdd::Result StudySearch::changes(qint64 position, int limit, std::vector<StudyCh
             if (static_cast<int>(page.size()) < wanted)
                 return;
         }
+    });
+}
+
+Kdd::Result StudySearch::tagFileProofs(const QByteArray& studyUID, TagFileProofs& proofs)
+{
+    return d->transact(Access::Read, [&] {
+        TagFileProofs found;
+        readTagFileProofs(d->connection, studyUID, found);
+        proofs = std::move(found);
     });
 }
 

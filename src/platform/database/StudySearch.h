@@ -139,6 +139,9 @@ public:
     /// from there misses none. Of a move the study that is beyond the limits is not named.
     Kdd::Result changes(qint64 position, int limit, std::vector<StudyChangeNote>& changes, qint64& last);
 
+    /// By what the tag file of the study is known, but for the former ones.
+    Kdd::Result tagFileProofs(const QByteArray& studyUID, TagFileProofs& proofs);
+
     /// Takes over what the study's tag file shows now, unless somebody else did so since `former` was read. `isDone` tells
     /// whether the rows were changed.
     Kdd::Result refresh(const FoundStudy& former, const BuiltStudy& present, bool& isDone);

@@ -51,7 +51,7 @@ Http::Response notThere(DicomWeb::Presence presence)
 {
     if (presence == DicomWeb::Presence::Absent)
         return Http::failure(404, QStringLiteral("There is no such study"));
-    if (presence == DicomWeb::Presence::Damaged)
+    if (presence == DicomWeb::Presence::Damaged || presence == DicomWeb::Presence::Missing)
         return Http::failure(500, QStringLiteral("The study's tag file cannot be read"));
     Http::Response response = Http::failure(503, QStringLiteral("The study is being written; ask again"));
     response.addHeader("Retry-After", kPatience);
@@ -111,7 +111,8 @@ Http::Response BrowserService::lookAt(const QByteArray& uid, const Look& look) c
     if (arrivals != nullptr)
         arrivals->bringInOwn(uid);
     DicomWeb::Presence presence = mShelf.find(uid, study);
-    if (presence == DicomWeb::Presence::Absent && arrivals != nullptr) {
+    const bool isThere = presence != DicomWeb::Presence::Absent && presence != DicomWeb::Presence::Missing;
+    if (!isThere && arrivals != nullptr) {
         const DicomWeb::Arrived arrived = arrivals->bringIn(uid);
         if (arrived == DicomWeb::Arrived::Brought)
             presence = mShelf.find(uid, study);

@@ -106,6 +106,7 @@ struct StudyShelf::Private
 
     bool isCurrent(Entry& entry, const QByteArray& path, Clock::time_point asked, bool needsTree);
     void read(Entry& entry, const QByteArray& uid, const QString& path);
+    Presence absence(const QByteArray& uid, const QByteArray& path);
     Presence look(const QByteArray& uid, bool needsTree, QByteArray& version,
                   std::shared_ptr<const ServedStudy>& study);
 
@@ -210,7 +211,7 @@ void StudyShelf::Private::read(Entry& entry, const QByteArray& uid, const QStrin
     const FileState before = stateOf(name);
     auto file = std::make_unique<TagFile>();
     if (before.isAbsent()) {
-        entry.presence = Presence::Absent;
+        entry.presence = absence(uid, name);
     } else if (file->readStampedWhenFree(path, uid.constData())) {
         Kxg::TagFileStamp stamp = file->stamp();
         stamp.fileSize = before.size;
@@ -233,7 +234,7 @@ void StudyShelf::Private::read(Entry& entry, const QByteArray& uid, const QStrin
         put(entry, std::make_shared<const ServedStudy>(std::move(file), version), weight);
         return;
     } else if (stateOf(name).isAbsent()) {
-        entry.presence = Presence::Absent;
+        entry.presence = absence(uid, name);
     } else if (file->wasLockedOut()) {
         entry.presence = Presence::Held;
         return;
@@ -243,6 +244,13 @@ void StudyShelf::Private::read(Entry& entry, const QByteArray& uid, const QStrin
     }
     entry.version.clear();
     put(entry, nullptr, 0);
+}
+
+Presence StudyShelf::Private::absence(const QByteArray& uid, const QByteArray& path)
+{
+    // A first one may have been written meanwhile, and be known before it was looked for.
+    return witness != nullptr && witness->isMissing(uid) && stateOf(path).isAbsent() ? Presence::Missing
+                                                                                     : Presence::Absent;
 }
 
 Presence StudyShelf::Private::look(const QByteArray& uid, bool needsTree, QByteArray& version,
@@ -268,7 +276,7 @@ Presence StudyShelf::Private::look(const QByteArray& uid, bool needsTree, QByteA
             study = studyOf(*entry);
         }
     }
-    if (presence == Presence::Absent)
+    if (presence == Presence::Absent || presence == Presence::Missing)
         forget(uid);
     trim();
     return presence;

@@ -49,6 +49,7 @@ enum class Presence {
     Absent,   ///< there is no tag file
     Held,     ///< others hold it longer than the site's patience; asking again makes sense
     Damaged,  ///< told in the log
+    Missing,  ///< there is no tag file, though there was one and images are registered; told in the log
 };
 
 /// What became of images that have arrived.
@@ -78,7 +79,7 @@ public:
     virtual void bringInOwn(const QByteArray& studyUID) = 0;
 };
 
-/// Knows by what a tag file was recognised when it was written. Called on several threads at the same time.
+/// Knows which tag files were written, and by what each was recognised then. Called on several threads at the same time.
 class TagFileWitness
 {
 public:
@@ -87,6 +88,9 @@ public:
     /// Whether the bytes that were read are others than those that were written, though the size and time of the file are
     /// as they were then: told in the log.
     virtual bool isDamaged(const QByteArray& studyUID, const Kxg::TagFileStamp& read) = 0;
+
+    /// Whether there should be a tag file where none is: told in the log.
+    virtual bool isMissing(const QByteArray& studyUID) = 0;
 };
 
 /// The tag files that were asked for last, read again as soon as they change. May be used on any thread.
@@ -104,7 +108,7 @@ public:
     void setArrivals(Arrivals* arrivals) { mArrivals = arrivals; }
     Arrivals* arrivals() const { return mArrivals; }
 
-    /// Who is asked of each tag file that is read; null: nobody. Likewise.
+    /// Who is asked of each tag file that is read or is not there; null: nobody. Likewise.
     void setWitness(TagFileWitness* witness);
 
     /// The study as its file is now.

@@ -58,7 +58,7 @@ TEST_F(DimseStore, KeepsTheBytesOfADatasetHoweverTheyComeInPieces)
     for (const auto& form : kForms) {
         for (const int piece : {2, 1000, 100000}) {
             QDir(mStore.filePath("objects")).removeRecursively();
-            QFile::remove(mStore.filePath("kdd.sqlite"));
+            Kxg::SetDatabaseServer(mDatabase + form.uid + QByteArray::number(piece));
             start();
             RawCaller caller(mServer->dimseAddress());
             caller.associate({{kCapture, {form.uid}}});

@@ -144,9 +144,14 @@ TEST_F(StudyFaults, WhatBecomesOfATagFileShowsAtOnce)
         EXPECT_EQ(get("studies").status, 200) << "the list stays";
     }
     QFile::remove(tagFile());
-    EXPECT_EQ(get("studies/1.2/metadata").status, 404);
+    // Of what is registered nobody is told that there is none.
+    for (const char* path : {"metadata", "instances", "corrections", "series/1.2.3/instances/1.2.3.2"})
+        EXPECT_EQ(get(QByteArray("studies/1.2/") + path).status, 500) << path;
+    EXPECT_TRUE(get("instances?PatientName=1").header("Warning").contains("299")) << "found without it";
     EXPECT_EQ(kdd("build --all").exitCode, 0);
     EXPECT_TRUE(get("studies/1.2/metadata").body == second.body) << "with its corrections";
+    EXPECT_EQ(kdd("delete 1.2").exitCode, 0);
+    EXPECT_EQ(get("studies/1.2/metadata").status, 404);
 }
 
 }  // namespace

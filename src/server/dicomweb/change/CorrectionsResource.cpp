@@ -65,6 +65,8 @@ Http::Response notThere(Presence presence)
         return studyIsBusy();
     case Presence::Damaged:
         return Http::failure(500, QStringLiteral("The study's tag file is damaged"));
+    case Presence::Missing:
+        return Http::failure(500, QStringLiteral("The study's tag file is missing"));
     default:
         return Http::failure(404, QStringLiteral("There is no such study"));
     }

@@ -43,6 +43,8 @@ Http::Response notThere(Presence presence)
     }
     case Presence::Damaged:
         return Http::failure(500, QStringLiteral("The study's tag file is damaged"));
+    case Presence::Missing:
+        return Http::failure(500, QStringLiteral("The study's tag file is missing"));
     default:
         return Http::failure(404, QStringLiteral("No such study"));
     }
@@ -67,9 +69,10 @@ Http::Response MetadataResource::answer(const Http::Request& request, const Reso
     if (arrivals != nullptr)
         arrivals->bringInOwn(path.study);
     Http::Response response = look(request, metadata);
-    // What is asked for may have arrived at another server a moment ago.
+    // What is asked for may have arrived at another server a moment ago, and a tag file that is no good be made anew by it.
+    const bool mayArrive = response.status == 404 || response.status == 500;
     const Arrived arrived =
-        response.status == 404 && arrivals != nullptr ? arrivals->bringIn(path.study) : Arrived::Nothing;
+        mayArrive && arrivals != nullptr ? arrivals->bringIn(path.study) : Arrived::Nothing;
     if (arrived == Arrived::Brought)
         response = look(request, metadata);
     return isLacking(arrived) ? notThere(Presence::Held) : std::move(response);

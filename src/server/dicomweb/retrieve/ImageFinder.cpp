@@ -23,7 +23,8 @@ Verdict findStudy(StudyShelf& shelf, const ResourcePath& path, std::shared_ptr<c
 {
     Presence presence = shelf.find(path.study, study);
     // What is asked for may have arrived a moment ago.
-    const bool mayHaveArrived = presence == Presence::Absent || (study != nullptr && !shows(*study, path));
+    const bool mayHaveArrived = presence == Presence::Absent || presence == Presence::Missing ||
+                                (study != nullptr && !shows(*study, path));
     if (mayHaveArrived && shelf.arrivals() != nullptr) {
         const Arrived arrived = shelf.arrivals()->bringIn(path.study);
         if (arrived == Arrived::Brought)
@@ -38,6 +39,8 @@ Verdict findStudy(StudyShelf& shelf, const ResourcePath& path, std::shared_ptr<c
         return {404, QStringLiteral("There is no such study")};
     case Presence::Held:
         return {503, QStringLiteral("The study is being changed; try again")};
+    case Presence::Missing:
+        return {500, QStringLiteral("The study's tag file is missing")};
     case Presence::Damaged:
         break;
     }

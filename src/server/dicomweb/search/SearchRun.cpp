@@ -99,7 +99,7 @@ std::shared_ptr<const ServedStudy> SearchRun::obtain(const QByteArray& studyUID)
     std::shared_ptr<const ServedStudy> study;
     const Presence presence = mShelf.find(studyUID, study);
     mIsHeldUp = mIsHeldUp || presence == Presence::Held;
-    if (presence == Presence::Damaged)
+    if (presence == Presence::Damaged || presence == Presence::Missing)
         mUnread.insert(studyUID);
     return study;
 }
