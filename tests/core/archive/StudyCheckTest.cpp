@@ -16,17 +16,19 @@ class CheckedArchive;
 /// How an archive comes to contradict itself, and what is told of it.
 using Contradiction = std::pair<void (*)(CheckedArchive&), const char*>;
 
-/// Study 1 of two images with previews and a volume, and study 2 of one that is corrected.
+/// Study 1 of two series with a volume each, the two of one suffix, and study 2 of one that is corrected.
 class CheckedArchive : public ArchiveTest, public testing::WithParamInterface<Contradiction>
 {
 public:
     CheckedArchive()
     {
-        for (const char* uid : {"a", "b"})
+        for (const char* uid : {"a", "b"}) {
+            const QByteArray series = *uid == 'a' ? "1.1" : "1.2";
             ArchiveTest::save(picture(uid), uid);
+            writeVolume(series + "-s.vol", {uid}, {{"G0020-000E", "UI:" + series}});
+            addVolume(series + "-s.vol", series);
+        }
         ArchiveTest::save("z", "2");
-        writeVolume("1.1-s.vol", {"a", "b"}, {{"G0020-000E", "UI:1.1"}});
-        addVolume("1.1-s.vol");
         buildAll();
         correct(edit({"z"}, {{DCM_PatientName, QStringLiteral("Roe^R")}}, "2"));
     }
@@ -37,10 +39,16 @@ public:
     static QString tags(const char* study = "1") { return TagFile::cacheFilePathForStudy(study); }
     static DatasetBuilder picture(const char* uid)
     {
-        return image(uid, "1").asPicture(kSize, kSize, 8).bytes(std::vector<Uint8>(kSize * kSize, 9));
+        return image(uid, "1")
+            .inSeries(*uid == 'b' ? "1.2" : "1.1")
+            .asPicture(kSize, kSize, 8)
+            .bytes(std::vector<Uint8>(kSize * kSize, 9));
     }
     QString file(const char* name) const { return QFile::decodeName(path(name)); }
-    void addVolume(const char* name) { registerFiles({{}, {{path(name), {}, "1", "1.1"}}, {}}); }
+    void addVolume(const QByteArray& name, const QByteArray& series)
+    {
+        registerFiles({{}, {{path(name), {}, "1", series}}, {}});
+    }
     void add(const DatasetBuilder& image, const char* name) { ArchiveTest::save(image, name); }
 
     /// Has the database take the tag file for one that shows all that it knows.
@@ -88,13 +96,13 @@ const Contradiction kContradictions[] = {
      "2: .*The tag file of study 1 ends early: 1 previews are missing\n"},
     {[](T& t) { t.add(T::picture("c"), "c"), t.accept(); },
      "1: Image c of study 1, c, is not in the tag file\n"},
-    {[](T& t) { t.addVolume("1.1-t.vol"), t.forget("b"), t.accept(); },
+    {[](T& t) { t.addVolume("1.1-t.vol", "1.1"), t.forget("b"), t.accept(); },
      "2: Image b of study 1 is not registered\nVolume file 1.1-t.vol of study 1 is not in the tag file\n"},
     {[](T& t) { t.forget("1.1-s.vol"), t.accept(); }, "1: Volume \"s\" of study 1 is not registered\n"},
     {[](T& t) { t.add(T::picture("b"), "b2"), t.accept(); },
      "1: Image b of study 1 is taken from b, but b2 is registered\n"},
     {[](T& t) { t.add(T::picture("b").inSeries("1.7"), "b"), t.accept(); },
-     "2: Image b of study 1 stands in series 1.1, but is registered in series 1.7\nImage b: .0020,000e. .*"},
+     "2: Image b of study 1 stands in series 1.2, but is registered in series 1.7\nImage b: .0020,000e. .*"},
     {[](T& t) { QFile::remove(t.file("b")); }, "1: Could not load b: .*"},
     {[](T& t) { T::image("z", "2").with(DCM_PatientSex, "O").save(t.file("z")); },
      "1: Image z: .0010,0040. .*"},
