@@ -114,6 +114,17 @@ QByteArray httpResponse(const QByteArray& body, const QByteArray& code)
     return "HTTP/1.1 " + code + "\r\nContent-Length: " + QByteArray::number(body.size()) + "\r\n\r\n" + body;
 }
 
+QByteArray chunkedResponse(const QByteArray& body)
+{
+    return "HTTP/1.1 200 OK\r\nETag: \"a\"\r\nTransfer-Encoding: chunked\r\n\r\n" +
+           QByteArray::number(body.size(), 16) + "\r\n" + body + "\r\n0\r\n\r\n";
+}
+
+QByteArray unmeasuredResponse(const QByteArray& body)
+{
+    return "HTTP/1.1 200 OK\r\nETag: \"a\"\r\nConnection: close\r\n\r\n" + body;
+}
+
 ScriptedServer::ScriptedServer(Script script)
     : mScript(std::move(script))
     , mOrigin("http://127.0.0.1:")

@@ -42,6 +42,11 @@ QByteArray headerOf(const QByteArray& request, const QByteArray& name);
 /// A response as it should be.
 QByteArray httpResponse(const QByteArray& body, const QByteArray& code = "200 OK");
 
+/// One that does not say beforehand how long the body is, which comes in chunks or ends with the connection.
+constexpr int kEndOfChunks = 7;  // [bytes]
+QByteArray chunkedResponse(const QByteArray& body);
+QByteArray unmeasuredResponse(const QByteArray& body);
+
 /// Does to a client what no proper server would. Each connection is for one request and has a thread.
 class ScriptedServer
 {

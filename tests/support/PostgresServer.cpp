@@ -122,11 +122,11 @@ FrozenPostgres::~FrozenPostgres()
     server().signal(SIGCONT);
 }
 
-void runOnPostgres(const QByteArray& sql)
+void runOnPostgres(const QByteArray& sql, const QByteArray& address)
 {
-    const QString address = QString::fromUtf8(postgresAddress("postgres"));
     QProcess client;
-    client.start(QStringLiteral("psql"), {QStringLiteral("-c"), QString::fromUtf8(sql), address});
+    client.start(QStringLiteral("psql"),
+                 {QStringLiteral("-c"), QString::fromUtf8(sql), QString::fromUtf8(address)});
     if (!client.waitForFinished(kPatience) || client.exitCode() != 0)
         throw std::runtime_error(client.readAllStandardError().toStdString());
 }

@@ -30,6 +30,6 @@ public:
 };
 
 /// Runs a statement over a connection of its own.
-void runOnPostgres(const QByteArray& sql);
+void runOnPostgres(const QByteArray& sql, const QByteArray& address = postgresAddress("postgres"));
 
 }  // namespace Kdd

@@ -182,18 +182,6 @@ TEST_F(CommandLine, DiffNamesEachDifference)
     EXPECT_EQ(kdd("diff 1.2 1.3 --json").json("differences").toArray().size(), 4);
 }
 
-TEST_F(CommandLine, VerifyNoticesWhatChangedOnDisk)
-{
-    addTwoStudies();
-    save("2", anImage("2").inSeries("1.2.4").with(DCM_PatientName, "Roe^R"));
-    QFile::remove(file("4"));
-    const Answer answer = kdd("verify --all --json");
-    EXPECT_EQ(answer.exitCode, 1);
-    EXPECT_EQ(answer.out, "{\"differences\":1,\"images\":3,\"studies\":2,\"unreadable\":1}\n");
-    EXPECT_TRUE(answer.err.contains("(0010,0010)"));
-    EXPECT_TRUE(answer.err.contains("/images/4"));
-}
-
 TEST_F(CommandLine, DeletesWhatIsNamedAndNothingElse)
 {
     addTwoStudies();

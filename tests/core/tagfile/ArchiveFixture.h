@@ -58,6 +58,12 @@ protected:
             .with(DCM_InstanceNumber, "1");
     }
 
+    /// One that takes 3 MB of a tag file that is not compressed.
+    static DatasetBuilder largeImage(const char* uid, const char* study)
+    {
+        return image(uid, study).data(DcmTag(0x6000, 0x3000, EVR_OB), QByteArray(3'000'000, '\x5a'));
+    }
+
     void save(const DatasetBuilder& image, const QByteArray& name)
     {
         image.save(QFile::decodeName(path(name)));
@@ -72,6 +78,13 @@ protected:
         QMap<QByteArray, qint64> requests;
         const Result result = mCatalogue->registerFiles(files, requests);
         ASSERT_TRUE(result.good()) << qPrintable(result.text());
+    }
+
+    /// What the database has of the corrections of an image.
+    void damageRecord(const char* study, const char* uid)
+    {
+        QMap<QByteArray, qint64> requests;
+        ASSERT_TRUE(mCatalogue->recordCorrections({{study, uid, study, "", uid, "?"}}, requests).good());
     }
 
     /// As a worker does it.

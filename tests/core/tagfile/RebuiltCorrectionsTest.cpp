@@ -14,6 +14,9 @@ namespace Kdd
 namespace
 {
 
+const QVector<QASubstitution> kRoe = {{DCM_PatientName, QStringLiteral("Roe^R")}};
+const QVector<QASubstitution> kNext = {{DCM_ImageComments, QStringLiteral("next")}};
+
 /// Corrections of studies that are built again afterwards.
 class RebuiltCorrections : public ArchiveTest
 {
@@ -25,6 +28,15 @@ protected:
         save("z", "2");
         buildAll();
         EXPECT_EQ(waiting(), 0);
+    }
+
+    /// What stands for its audit log in an image of a tag file.
+    static void setLog(const char* study, const char* uid, const QByteArray& stored)
+    {
+        TagFile file;
+        ASSERT_TRUE(file.readCacheFileForStudy(study, true));
+        file.findImage(uid)->putAndInsertValue({0x0071, 0x0021}, kOurPrivateCreator, VrCode::UT, stored);
+        ASSERT_TRUE(file.writeCacheFile());
     }
 
     const Uids mAll = {"1", "2", "3"};
@@ -54,7 +66,7 @@ TEST_F(RebuiltCorrections, WhatWasMovedAndDeletedDoesNotComeBack)
 
 TEST_F(RebuiltCorrections, AFileThatArrivesAgainUnderItsFormerStudyFollows)
 {
-    correct(move({"a"}, "1", "2", {{DCM_PatientName, QStringLiteral("Roe^R")}}));
+    correct(move({"a"}, "1", "2", kRoe));
     const DcmTag creator(0x0071, 0x0010, EVR_LO);  // of the block that the log had
     const DcmTag theirs(0x0071, 0x1021, EVR_LO);
     save(image("a", "1").with(DCM_ImageComments, "sent again").with(creator, "Other").with(theirs, "theirs"),
@@ -69,9 +81,9 @@ TEST_F(RebuiltCorrections, AFileThatArrivesAgainUnderItsFormerStudyFollows)
 TEST_F(RebuiltCorrections, AnotherJobWaitsUntilTheInterruptedOneIsBuilt)
 {
     const Files before = tagFiles(mAll);
-    correct(edit({"a"}, {{DCM_PatientName, QStringLiteral("Roe^R")}}));
+    correct(edit({"a"}, kRoe));
     putBack(mAll, before);
-    const QAData next = edit({"a"}, {{DCM_ImageComments, QStringLiteral("next")}});
+    const QAData next = edit({"a"}, kNext);
     EXPECT_NE(refusal(next).find("study 1 is to be built first"), std::string::npos);
     EXPECT_EQ(waiting(), 1);
     build("1");
@@ -82,19 +94,14 @@ TEST_F(RebuiltCorrections, AnotherJobWaitsUntilTheInterruptedOneIsBuilt)
 
 TEST_F(RebuiltCorrections, WhatCannotBeWrittenIsNotKeptEither)
 {
-    constexpr int kLarge = 3000000;
     const LogCapture quiet;
-    const QByteArray pixels(kLarge, '\x5a');
-    DatasetBuilder large = image("large", "1");
-    large.dataset().putAndInsertUint8Array(DcmTagKey(0x6000, 0x3000),
-                                           reinterpret_cast<const Uint8*>(pixels.constData()), kLarge);
-    save(large, "large");
+    save(largeImage("large", "1"), "large");
     TagFile::setCompressionMode(TagFile::CompressionMode::None);
     buildAll();
-    correct(edit({"b"}, {{DCM_PatientName, QStringLiteral("Roe^R")}}));
+    correct(edit({"b"}, kRoe));
     const std::string before = shown(mAll);
     {
-        const FullDisk disk(2000000);
+        const FullDisk disk(2'000'000);
         EXPECT_NE(refusal(edit({"a", "b"}, {{DCM_PatientName, QStringLiteral("Poe^P")}})), "");
         EXPECT_NE(refusal(move({"a", "b"}, "1", "3", {{DCM_SOPInstanceUID, QStringLiteral("x")}})), "")
             << "two of one UID";
@@ -108,13 +115,9 @@ TEST_F(RebuiltCorrections, WhatCannotBeWrittenIsNotKeptEither)
     TagFile::setCompressionMode(TagFile::CompressionMode::Zlib);
 }
 
-TEST_F(RebuiltCorrections, WithoutItsDatabaseACorrectionIsRefused)
+TEST_F(RebuiltCorrections, OfAStudyThatOthersWorkOnAreRefused)
 {
     const std::string before = shown(mAll);
-    Kxg::SetDatabaseServer("sqlite:/proc/none/catalogue.db");
-    EXPECT_NE(refusal(edit({"a"}, {{DCM_PatientName, QStringLiteral("Roe^R")}})).find("could not be kept"),
-              std::string::npos);
-    Kxg::SetDatabaseServer(mAddress);
     std::unique_ptr<Kxg::StudyClaim> claim;
     ASSERT_TRUE(mCatalogue->claim("2", 0, claim).good() && claim != nullptr);
     QAData job = move({"a"}, "1", "2");
@@ -127,7 +130,7 @@ TEST_F(RebuiltCorrections, WithoutItsDatabaseACorrectionIsRefused)
 TEST_F(RebuiltCorrections, WhatWaitedBeforeGoesOnWaiting)
 {
     save("d", "1");
-    correct(edit({"a"}, {{DCM_PatientName, QStringLiteral("Roe^R")}}));
+    correct(edit({"a"}, kRoe));
     correct(move({"a", "b", "c"}, "1", "2"));
     EXPECT_EQ(imagesIn("1"), Uids());
     EXPECT_EQ(waiting(), 1);
@@ -138,13 +141,73 @@ TEST_F(RebuiltCorrections, WhatWaitedBeforeGoesOnWaiting)
 TEST_F(RebuiltCorrections, AJobOnWhatIsNotAdoptedYetKeepsAllOfIt)
 {
     Kxg::SetDatabaseServer(QByteArray());
-    correct(edit({"a"}, {{DCM_PatientName, QStringLiteral("Roe^R")}}));
+    correct(edit({"a"}, kRoe));
     correct(move({"c"}, "1", "2", {{DCM_SOPInstanceUID, QStringLiteral("c2")}}));
     Kxg::SetDatabaseServer(mAddress);
-    correct(edit({"a"}, {{DCM_ImageComments, QStringLiteral("next")}}));
-    correct(edit({"c2"}, {{DCM_ImageComments, QStringLiteral("next")}}, "2"));
+    correct(edit({"a"}, kNext));
+    correct(edit({"c2"}, kNext, "2"));
     expectSurvival(mAll);
     EXPECT_EQ(imagesIn("1") + imagesIn("2"), (Uids{"a", "b", "c2", "z"}));
+}
+
+TEST_F(RebuiltCorrections, ADamagedLogIsToldAndNothingElseSuffers)
+{
+    const LogCapture log;
+    Kxg::SetDatabaseServer(QByteArray());
+    correct(edit({"a", "b"}, kRoe));
+    correct(edit({"z"}, kRoe, "2"));
+    correct(move({"c"}, "1", "2"));
+    Kxg::SetDatabaseServer(mAddress);
+    setLog("1", "a", "no base64!");
+    setLog("2", "c", QByteArray("now\n0010-0010\n").toBase64());
+    EXPECT_NE(refusal(edit({"a"}, kNext)), "");
+    EXPECT_NE(refusal(edit({"c"}, kNext, "2")), "");
+    buildAll();
+    for (const char* told : {"image a of study 1", "image c of study 2"})
+        EXPECT_EQ(log.count("The corrections of " + std::string(told) + " cannot be kept"), 1);
+    EXPECT_EQ(imagesIn("1") + imagesIn("2"), (Uids{"a", "b", "c", "z"})) << "c is where its file says";
+    EXPECT_EQ(value("1", "a", DCM_PatientName), "Roe^R") << "as the tag file has it";
+    putBack(mAll, {});
+    buildAll();
+    EXPECT_EQ(value("1", "a", DCM_PatientName), "Doe^J");
+    EXPECT_EQ(value("1", "b", DCM_PatientName) + value("2", "z", DCM_PatientName), "Roe^RRoe^R");
+}
+
+TEST_F(RebuiltCorrections, WhatATagFileAloneTellsIsTakenUnlessTheDatabaseKnowsBetter)
+{
+    const LogCapture log;
+    const Files before = tagFiles(mAll);
+    correct(edit({"a"}, kRoe));
+    putBack(mAll, before);
+    Kxg::SetDatabaseServer(QByteArray());
+    correct(edit({"a"}, {{DCM_PatientName, QStringLiteral("Poe^P")}}));
+    correct(move({"b", "c"}, "1", "2"));
+    Kxg::SetDatabaseServer(mAddress);
+    QFile::remove(QFile::decodeName(path("b")));
+    ASSERT_TRUE(mCatalogue->removeImage("1", "c").good());
+    build("2");
+    build("1");
+    EXPECT_EQ(log.count("Image a of study 1 was corrected otherwise"), 1);
+    EXPECT_EQ(value("1", "a", DCM_PatientName), "Roe^R");
+    EXPECT_EQ(log.count("image c of study 2 cannot be kept"), 1);
+    EXPECT_EQ(imagesIn("1") + imagesIn("2"), (Uids{"a", "b", "c", "z"}));
+    expectSurvival(mAll);
+}
+
+TEST_F(RebuiltCorrections, ADamagedRecordIsMadeAnewFromTheLogOrToldAndTheRestIsBuilt)
+{
+    const LogCapture log;
+    correct(edit({"a", "b"}, kRoe));
+    damageRecord("1", "a");
+    EXPECT_NE(refusal(edit({"a"}, kNext)).find("of image a is damaged"), std::string::npos);
+    expectSurvival(mAll);
+    correct(edit({"a"}, kNext));
+    damageRecord("1", "a");
+    putBack(mAll, {});
+    buildAll();
+    EXPECT_EQ(log.count("of the corrections of image a of study 1 is damaged"), 1);
+    EXPECT_EQ(imagesIn("1"), (Uids{"b", "c"}));
+    EXPECT_EQ(value("1", "b", DCM_PatientName), "Roe^R");
 }
 
 TEST_F(RebuiltCorrections, MovesInOppositeDirectionsAtOnceLoseNothing)
@@ -181,26 +244,59 @@ protected:
         : ArchiveTest(newPostgresDatabase())
     {
     }
+
+    /// Whoever comes to do this loses the connection.
+    void loseAt(const char* event) const
+    {
+        runOnPostgres("CREATE OR REPLACE FUNCTION lose() RETURNS trigger LANGUAGE plpgsql AS"
+                      " 'BEGIN PERFORM pg_terminate_backend(pg_backend_pid()); RETURN NULL; END';"
+                      "CREATE TRIGGER lose BEFORE " +
+                          QByteArray(event) + " FOR EACH ROW EXECUTE FUNCTION lose()",
+                      mAddress);
+    }
+    void loseNoMore() const { runOnPostgres("DROP FUNCTION lose CASCADE", mAddress); }
 };
 
-TEST_F(RebuiltCorrectionsOnServer, StayWithTheirLogs)
+TEST_F(RebuiltCorrectionsOnServer, AreMadeByTheBuildWhenTheDatabaseIsLostAtTheirEnd)
 {
-    for (const char* uid : {"a", "b"})
-        save(uid, "1");
+    const LogCapture log;
+    save(largeImage("a", "1"), "a");
+    save("b", "1");
+    save(image("b", "2"), "b-of-2");
+    TagFile::setCompressionMode(TagFile::CompressionMode::None);
     buildAll();
-    correct(edit({"a", "b"}, {{DCM_PatientName, QStringLiteral("Roe^R")}}));
-    correct(move({"a"}, "1", "2", {{DCM_SOPInstanceUID, QStringLiteral("a2")}}));
-    correct(move({"b"}, "1", "2"));
+    const std::string before = shown({"1", "2"});
+    loseAt("INSERT ON correction");
+    EXPECT_NE(refusal(edit({"a"}, kRoe)).find("could not be kept"), std::string::npos);
     EXPECT_EQ(waiting(), 0);
-    EXPECT_EQ(studies(), Uids{"2"}) << "nothing is left of the first one";
-    std::vector<Kxg::StudySummary> list;
-    ASSERT_TRUE(mCatalogue->listStudies(list).good());
-    EXPECT_EQ(list.front().patientName, "Roe^R");
-    expectSurvival({"1", "2"});
-    correct(move({"a2"}, "2", "1", {{DCM_SOPInstanceUID, QStringLiteral("a")}}));
-    expectSurvival({"1", "2"});
+    loseNoMore();
+    auto disk = std::make_unique<FullDisk>(2'000'000);
+    loseAt("DELETE ON correction");
+    EXPECT_NE(refusal(edit({"a"}, kRoe)).find("keeps the correction ("), std::string::npos);
+    loseNoMore();
+    EXPECT_EQ(shown({"1", "2"}), before);
+    disk.reset();
+    buildAll();
     EXPECT_EQ(value("1", "a", DCM_PatientName), "Roe^R");
-    EXPECT_EQ(imagesIn("2"), Uids{"b"});
+    disk = std::make_unique<FullDisk>(2'000'000);
+    EXPECT_NE(refusal(move({"b"}, "1", "2")).find("keeps the correction, and"), std::string::npos)
+        << "it cannot be taken back: files of the image that is replaced would go along";
+    disk.reset();
+    buildAll();
+    EXPECT_EQ(imagesIn("1") + imagesIn("2"), (Uids{"a", "b"}));
+    loseAt("DELETE ON build_request");
+    correct(move({"a"}, "1", "2"));
+    loseNoMore();
+    EXPECT_EQ(log.count(" is built once more: "), 2);
+    EXPECT_EQ(waiting(), 2);
+    correct(move({"a"}, "1", "2"));
+    expectSurvival({"1", "2"});
+    EXPECT_EQ(imagesIn("2"), (Uids{"a", "b"}));
+    EXPECT_EQ(studies(), Uids{"2"}) << "nothing is left of the first one";
+    correct(move({"a"}, "2", "1", {{DCM_SOPInstanceUID, QStringLiteral("a2")}}));
+    expectSurvival({"1", "2"});
+    EXPECT_EQ(value("1", "a2", DCM_PatientName), "Roe^R");
+    TagFile::setCompressionMode(TagFile::CompressionMode::Zlib);
 }
 
 // ---- overlays

@@ -71,14 +71,11 @@ const Sender kSenders[] = {
          return whole(object, "Content-Length: " + QByteArray::number(object.size()) + "\r\n");
      },
      3},
-    {"NoLength",
-     [](const QByteArray& object, const QByteArray& /*request*/) {
-         return whole(object, "Connection: close\r\n");
-     },
-     2},
+    {"Chunks",
+     [](const QByteArray& object, const QByteArray& /*request*/) { return chunkedResponse(object); }, 2},
     {"RangesWithoutLength",
      [](const QByteArray& object, const QByteArray& request) {
-         return headerOf(request, "Range").isEmpty() ? whole(object, "Connection: close\r\n")
+         return headerOf(request, "Range").isEmpty() ? unmeasuredResponse(object)
                                                      : ranged(object, request, "*");
      },
      2},
@@ -118,6 +115,8 @@ TEST(RemoteFile, IsNotOpenedWhenItIsNotThere)
                 HasSubstr("early"));
     EXPECT_THAT(faultOf(ObjectServer(someObject(5000), [](auto& answer) { ++answer.first; }).url()),
                 HasSubstr("another range"));
+    EXPECT_THAT(faultOf(ScriptedServer(chunkedResponse(someObject(5000)).chopped(kEndOfChunks)).url("a")),
+                HasSubstr("outstanding"));
     const auto empty = open(ScriptedServer(httpResponse("", "416 Range Not Satisfiable")).url("a"));
     ASSERT_NE(empty, nullptr);
     EXPECT_EQ(empty->size(), 0);
@@ -144,10 +143,35 @@ TEST(RemoteFile, GivesNothingMoreOnceTheServerHasAnotherObject)
         ASSERT_NE(file, nullptr);
         EXPECT_EQ(part(*file, 500, 1000), object.mid(500, 1000));
         isSpoiled = true;
-        EXPECT_EQ(part(*file, 1'000'000, 100), "") << reason;
+        EXPECT_EQ(part(*file, 1'000'000, 1'000'000), "") << reason;
         EXPECT_THAT(file->fault().text().toStdString(), HasSubstr(reason));
         isSpoiled = false;
         EXPECT_EQ(part(*file, 1'000'000, 100), "") << "also when it is back";
+    }
+}
+
+/// What a server without ranges sends when it is asked for what has gone by.
+const std::pair<const char*, QByteArray> kSecondAnswers[] = {
+    {"changed", httpResponse(someObject(2'999'999))},
+    {"changed", whole(someObject(3'000'000), "Content-Length: 3000000\r\n")},
+    {"404", httpResponse("no", "404 Not Found")},
+    {"with 1 bytes", httpResponse(someObject(3'000'000)).chopped(1)},
+};
+
+TEST(RemoteFile, DoesNotGoBackInAWholeObjectThatIsAnotherOrBreaksOff)
+{
+    const QByteArray object = someObject(3'000'000);
+    for (const auto& [reason, second] : kSecondAnswers) {
+        std::atomic<int> asked{0};
+        const ScriptedServer server([&, second = second](const QByteArray& /*request*/) {
+            // First in vain for a range, then for the whole.
+            return ScriptedServer::Reply{asked++ < 2 ? httpResponse(object) : second};
+        });
+        const auto file = open(server.url("a"));
+        ASSERT_NE(file, nullptr);
+        EXPECT_EQ(part(*file, 400'000, 100), object.mid(400'000, 100));
+        EXPECT_EQ(part(*file, 300'000, 2'700'000), "");
+        EXPECT_THAT(file->fault().text().toStdString(), HasSubstr(reason));
     }
 }
 

@@ -91,8 +91,10 @@ Result QAJob::applyTo(const QByteArray& key)
 Result QAJob::applyTo(TagMap& image, const QByteArray& key)
 {
     Edit edit = {image, key, image.uid(TagMap::SeriesLevel), {}, {}};
-    // What a damaged log told could not be told again, so nothing may be written in its place.
-    if (!edit.before.read(image))
+    // What a damaged log told could not be told again, so nothing may be written in its place; and behind what is cut off
+    // a new entry would be read as its rest.
+    QVector<AuditEntry> entries;
+    if (!edit.before.read(image) || !edit.before.decode(entries))
         return failAt(key, QStringLiteral("its audit log is damaged"));
     if (mReordersImages)
         // Before the image changes, while volume and image still agree on its place.
