@@ -4,6 +4,10 @@
 #include "support/LogCapture.h"
 #include "support/Process.h"
 
+#include <QThread>
+
+#include <future>
+
 namespace Kdd
 {
 namespace
@@ -65,6 +69,25 @@ TEST_F(UnregisteredStudy, LosesWhatIsNamedAndNothingElse)
         EXPECT_EQ(imagesIn("1") + imagesIn("2"), left);
     }
     EXPECT_EQ(tagFiles({"1", "2"}), Files());
+}
+
+TEST_F(UnregisteredStudy, IsTheOneThatAnotherRemovedMeanwhile)
+{
+    Result result;
+    const auto known = Kxg::Catalogue::open(mAddress, result);
+    std::unique_ptr<Kxg::StudyClaim> claim;
+    ASSERT_TRUE(known->claim("2", 0, claim).good());
+    auto second = std::async(std::launch::async, [&] {
+        const auto own = Kxg::Catalogue::open(mAddress, result);
+        return StudyChange(*own).remove({"2", "", ""}, 60'000);
+    });
+    QThread::msleep(300);  // of which it mostly waits for the first one
+    ASSERT_TRUE(known->removeStudy("2").good() && claim->noteRequests().good());
+    QFile::remove(TagFile::cacheFilePathForStudy("2"));
+    ASSERT_TRUE(claim->finishRemoved().good());
+    claim.reset();
+    const Removal removal = second.get();
+    EXPECT_EQ(removal.fault, Fault::Absent) << removal.result.text().toStdString();
 }
 
 TEST_F(UnregisteredStudy, StaysAsItIsWhenItCannotBeReadHeldOrWritten)

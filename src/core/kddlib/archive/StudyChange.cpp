@@ -114,12 +114,20 @@ Result tryFor(int patienceMs, bool (*attempt)(QAData&, QString&), QAData& job)
 
 Removal StudyChange::remove(const ArchiveNode& node, int patienceMs)
 {
-    QVector<QByteArray> registered;
-    // One is enough: before all UIDs that it begins comes the UID itself.
-    const Result found = mCatalogue.findStudies(node.study, 1, registered);
+    bool isRegistered = false;
+    const Result found = findStudy(node.study, isRegistered);
     if (found.bad())
         return unasked(found);
-    return registered.contains(node.study) ? removeRegistered(node, patienceMs) : removeUnregistered(node);
+    return isRegistered ? removeRegistered(node, patienceMs) : removeUnregistered(node);
+}
+
+Result StudyChange::findStudy(const QByteArray& studyUID, bool& isRegistered)
+{
+    QVector<QByteArray> found;
+    // One is enough: before all UIDs that it begins comes the UID itself.
+    Result result = mCatalogue.findStudies(studyUID, 1, found);
+    isRegistered = found.contains(studyUID);
+    return result;
 }
 
 Removal StudyChange::removeRegistered(const ArchiveNode& node, int patienceMs)
@@ -132,13 +140,14 @@ Removal StudyChange::removeRegistered(const ArchiveNode& node, int patienceMs)
                 Result::failure(QStringLiteral("Study %1 is being worked on by another process")
                                     .arg(QString::fromUtf8(node.study))),
                 0};
+    bool isRegistered = true;
+    // Others may have removed it while this waited for them.
+    if (result.bad() && findStudy(node.study, isRegistered).good() && !isRegistered)
+        return removeUnregistered(node);
     if (result.good())
         result = mCatalogue.studyContents(node.study, contents);
     if (result.bad())
         return unasked(result);
-    // Others may have removed it while this waited for them.
-    if (contents.id == 0)
-        return removeUnregistered(node);
     // What a removal that died has left in the tag file goes with its repeat.
     TagFile present;
     const bool isWholeStudy = node.series.isEmpty() && node.image.isEmpty();
