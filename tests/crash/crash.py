@@ -1,7 +1,7 @@
 #!/usr/bin/env python3
 """Kills each operation at every call that changes a file, in turn, and has each such call fail in turn.
 
-    crash.py KDD [--database sqlite|postgresql] [--operation NAME]... [--every N] [--folder FOLDER]
+    crash.py KDD [--database sqlite|postgresql] [--operation NAME]... [--kind CALL]... [--every N] [--folder FOLDER]
 
 A process is killed as it enters the N-th call of its kind (write, truncate, rename, link, lock, remove, flush, send to the
 database), for every kind and every N that the operation comes to; then as often the call fails, as on a full disk or a broken
@@ -241,9 +241,9 @@ class Attack:
         differing = [key for key in sorted(set(state) | set(self.whole)) if state.get(key) != self.whole.get(key)]
         return f"after the repeat differ {differing}" if differing else ""
 
-    def all(self, every):
+    def all(self, kinds, every):
         runs, index = 0, 0
-        for kind in KINDS:
+        for kind in kinds:
             for number in range(1, self.calls[kind] + 1):
                 for fault in ["KILL"] + FAULTS.get(kind, []):
                     index += 1
@@ -267,6 +267,7 @@ def main():
     parser.add_argument("kdd")
     parser.add_argument("--database", choices=("sqlite", "postgresql"), default="sqlite")
     parser.add_argument("--operation", action="append", choices=[each.name for each in OPERATIONS])
+    parser.add_argument("--kind", action="append", choices=KINDS)
     parser.add_argument("--every", type=int, default=1)
     parser.add_argument("--folder")
     wanted = parser.parse_args()
@@ -281,7 +282,7 @@ def main():
                 if wanted.operation and operation.name not in wanted.operation:
                     continue
                 attack = Attack(site, operation)
-                runs = attack.all(wanted.every)
+                runs = attack.all(wanted.kind or KINDS, wanted.every)
                 faults += len(attack.faults)
                 print(f"{operation.name}: {sum(attack.calls.values())} calls, {runs} faults put in, {len(attack.faults)} found",
                       flush=True)

@@ -14,6 +14,7 @@ those of a folder.
 or it fails. With --every 7 each seventh pair is done, from the one that --seed numbers.
 """
 import argparse
+import itertools
 import os
 import subprocess
 import sys
@@ -86,8 +87,7 @@ def sequences(wanted):
     elif wanted.pairs:
         yield from list(pairs.sequences())[wanted.seed - 1::wanted.every]
     else:
-        for number in range(wanted.steps // wanted.length + 1):
-            seed = wanted.seed + number
+        for seed in itertools.count(wanted.seed):
             yield "The sequence of seed %d" % seed, random_sequence(seed, wanted.length)
 
 

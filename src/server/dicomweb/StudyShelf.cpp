@@ -106,7 +106,7 @@ struct StudyShelf::Private
 
     bool isCurrent(Entry& entry, const QByteArray& path, Clock::time_point asked, bool needsTree);
     void read(Entry& entry, const QByteArray& uid, const QString& path);
-    Presence absence(const QByteArray& uid, const QByteArray& path);
+    Presence absence(const QByteArray& uid, const QByteArray& path) const;
     Presence look(const QByteArray& uid, bool needsTree, QByteArray& version,
                   std::shared_ptr<const ServedStudy>& study);
 
@@ -246,7 +246,7 @@ void StudyShelf::Private::read(Entry& entry, const QByteArray& uid, const QStrin
     put(entry, nullptr, 0);
 }
 
-Presence StudyShelf::Private::absence(const QByteArray& uid, const QByteArray& path)
+Presence StudyShelf::Private::absence(const QByteArray& uid, const QByteArray& path) const
 {
     // A first one may have been written meanwhile, and be known before it was looked for.
     return witness != nullptr && witness->isMissing(uid) && stateOf(path).isAbsent() ? Presence::Missing

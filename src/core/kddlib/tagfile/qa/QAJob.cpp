@@ -23,6 +23,7 @@ namespace
 
 const char* const kCategory = "TagFileQA";
 const char* const kInBothStudies = "until the job is run again its images may stand in both studies";
+const char* const kPromised = "whoever opens the tag file next makes it";
 
 /// A failure with what it leaves behind.
 Result leaving(const QString& reason, const QString& left)
@@ -231,10 +232,11 @@ Result QAJob::write()
     if (!mDestination.tree().isEmpty())
         result = mDestination.writeHeld();
     if (result.bad()) {
-        // A journal is a promise: whoever opens the destination next gives it the images that the source still has.
-        const bool isPromised = mIsMove && mDestination.file().hasJournal();
-        return isPromised ? leaving(result.text(), QLatin1String(kInBothStudies))
-                          : failWriting(result.text());
+        // A journal is a promise: whoever opens the destination next gives it what was to be written. So the database keeps
+        // it too, or the file would show a correction of which nobody knows.
+        return mDestination.file().hasJournal()
+                   ? leaving(result.text(), QLatin1String(mIsMove ? kInBothStudies : kPromised))
+                   : failWriting(result.text());
     }
     if (mIsMove)
         result = writeSource();
