@@ -2,14 +2,13 @@
 
 #include "platform/database/CorrectionRows.h"
 #include "platform/database/FileRegistration.h"
+#include "platform/database/FormerDatabases.h"
 #include "platform/database/Schema.h"
 #include "platform/database/StudyContent.h"
 #include "platform/database/StudyListing.h"
 #include "platform/volumefile/VolumeFileName.h"
 
 #include <algorithm>
-#include <mutex>
-#include <set>
 #include <utility>
 
 namespace Kxg
@@ -55,33 +54,6 @@ StudySummary summaryOf(const SqlRows& rows)
     study.tagFile = {rows.number(9), rows.bytes(10)};
     return study;
 }
-
-/// The databases that this process had open. One of them that is gone is in other hands, being moved or restored, or lies
-/// on a disk that fell away: an empty one in its place would tell that there are no studies, and take what comes.
-class FormerDatabases
-{
-public:
-    static bool has(const DatabaseAddress& address)
-    {
-        const std::lock_guard<std::mutex> lock(sMutex);
-        return all().count(address.shown) != 0;
-    }
-    static void add(const DatabaseAddress& address)
-    {
-        const std::lock_guard<std::mutex> lock(sMutex);
-        all().insert(address.shown);
-    }
-
-private:
-    static std::set<QString>& all()
-    {
-        static std::set<QString> sAll;
-        return sAll;
-    }
-    static std::mutex sMutex;
-};
-
-std::mutex FormerDatabases::sMutex;
 
 std::unique_ptr<Catalogue> openWith(const QByteArray& address, SqlConnection::IfAbsent ifAbsent,
                                     Kdd::Result& result)
