@@ -111,8 +111,7 @@ Http::Response BrowserService::lookAt(const QByteArray& uid, const Look& look) c
     if (arrivals != nullptr)
         arrivals->bringInOwn(uid);
     DicomWeb::Presence presence = mShelf.find(uid, study);
-    const bool isThere = presence != DicomWeb::Presence::Absent && presence != DicomWeb::Presence::Missing;
-    if (!isThere && arrivals != nullptr) {
+    if (study == nullptr && presence != DicomWeb::Presence::Held && arrivals != nullptr) {
         const DicomWeb::Arrived arrived = arrivals->bringIn(uid);
         if (arrived == DicomWeb::Arrived::Brought)
             presence = mShelf.find(uid, study);

@@ -107,6 +107,28 @@ TEST_F(StoreTest, WhatOneServerStoredAnotherOneFindsAtOnce)
     }
 }
 
+TEST_F(StoreTest, ATagFileThatIsNoGoodIsMadeAnewWithWhatAnotherOneTook)
+{
+    const QString tagFile = TagFile::cacheFilePathForStudy("1.2");
+    start();
+    std::unique_ptr<Server> other = std::move(mServer);
+    start();
+    for (int i = 1; i <= 6; ++i) {
+        other.swap(mServer);
+        const QByteArray uid = "1.2.3." + QByteArray::number(i);
+        ASSERT_EQ(store(anImage(uid)).status, 200);
+        other.swap(mServer);
+        if (i % 2 == 0)
+            QFile::remove(tagFile);
+        else
+            putFile(tagFile, "no tag file");
+        const QByteArray image = "/dicom-web/studies/1.2/series/1.2.3/instances/" + uid;
+        const QByteArray ways[] = {image, image + "/metadata", "/browser/studies/1.2"};
+        EXPECT_EQ(ask("GET", ways[i % 3]).status, 200) << ways[i % 3].constData();
+        EXPECT_EQ(instances("1.2"), i);
+    }
+}
+
 TEST_F(StoreTest, TellsNothingIncompleteOfAStudyThatAnotherOneWorksOn)
 {
     Result result;

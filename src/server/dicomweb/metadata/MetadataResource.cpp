@@ -69,7 +69,7 @@ Http::Response MetadataResource::answer(const Http::Request& request, const Reso
     if (arrivals != nullptr)
         arrivals->bringInOwn(path.study);
     Http::Response response = look(request, metadata);
-    // What is asked for may have arrived at another server a moment ago, and a tag file that is no good be made anew by it.
+    // What is asked for may have arrived at another server a moment ago, and a tag file that is no good be made anew with it.
     const bool mayArrive = response.status == 404 || response.status == 500;
     const Arrived arrived =
         mayArrive && arrivals != nullptr ? arrivals->bringIn(path.study) : Arrived::Nothing;

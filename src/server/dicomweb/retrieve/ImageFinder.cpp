@@ -22,9 +22,8 @@ bool shows(const ServedStudy& study, const ResourcePath& path)
 Verdict findStudy(StudyShelf& shelf, const ResourcePath& path, std::shared_ptr<const ServedStudy>& study)
 {
     Presence presence = shelf.find(path.study, study);
-    // What is asked for may have arrived a moment ago.
-    const bool mayHaveArrived = presence == Presence::Absent || presence == Presence::Missing ||
-                                (study != nullptr && !shows(*study, path));
+    // What is asked for may have arrived a moment ago, and a tag file that is no good be made anew with it.
+    const bool mayHaveArrived = presence != Presence::Held && (study == nullptr || !shows(*study, path));
     if (mayHaveArrived && shelf.arrivals() != nullptr) {
         const Arrived arrived = shelf.arrivals()->bringIn(path.study);
         if (arrived == Arrived::Brought)
