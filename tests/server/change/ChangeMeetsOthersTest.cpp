@@ -56,6 +56,22 @@ TEST_P(ChangeMeetsOthers, KeepsACorrectionThroughWhateverComesNext)
     kdd({QStringLiteral("verify"), QStringLiteral("--all")});
 }
 
+TEST_P(ChangeMeetsOthers, TellsOfATagFileThatIsMissingAndNotThatThereAreNoImages)
+{
+    storeStudy();
+    kdd({QStringLiteral("build"), QStringLiteral("--all")});
+    mServer.reset();
+    mSettings.objects.reset();  // what arrives would have it made anew
+    mSettings.takesByRequest = false;
+    start();
+    QFile::remove(TagFile::cacheFilePathForStudy("1.2"));
+    const char* job = R"({"tags":[{"tag":"00100010","value":"Roe^Jane"}]})";
+    EXPECT_EQ(correct("1.2", "?all=true", job).status, 500);
+    kdd({QStringLiteral("build"), QStringLiteral("--all")});
+    EXPECT_EQ(correct("1.2", "?all=true", job).status, 200);
+    EXPECT_EQ(values("1.2", "00100010"), "Roe^Jane Roe^Jane Roe^Jane");
+}
+
 TEST_P(ChangeMeetsOthers, BringsBackWhatWasDeletedWithItsCorrections)
 {
     storeStudy();

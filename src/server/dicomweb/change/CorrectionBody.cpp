@@ -107,6 +107,10 @@ Http::Response CorrectionBody::correct()
     const bool hasImages = outcome.asked > missing.size();
     if (!hasImages && isLacking(arrived))
         return studyIsBusy();
+    // Without it nothing is known of images that are registered: that there are none would be taken for an answer.
+    std::shared_ptr<const ServedStudy> study;
+    if (!hasImages && mStudies.find(from, study) == Presence::Missing)
+        return Http::failure(500, QStringLiteral("The study's tag file is missing"));
     Http::Response response = Http::textResponse(hasImages ? 200 : 404, "application/json",
                                                  correctionReport(mJob, mOrder.root, mOrder.isPreview));
     response.addHeader("Cache-Control", "no-store");

@@ -18,7 +18,7 @@ class TagMap;
 namespace Kdd::DicomWeb
 {
 
-/// The study that a path names; 404 when there is none, 503 while others hold it, 500 when its tag file is damaged.
+/// The study that a path names; 404 when there is none, 503 while others hold it, 500 when its tag file is missing or damaged.
 Verdict findStudy(StudyShelf& shelf, const ResourcePath& path, std::shared_ptr<const ServedStudy>& study);
 
 /// The image that the path names within the study, where the tag file shows it now; null when there is none. To be

@@ -99,7 +99,7 @@ Http::Response SearchResource::answer(const Http::Request& request, const Resour
             return done;
         }
         if (run.unread() > 0 && !search.study.isEmpty()) {
-            response = Http::failure(500, QStringLiteral("The study's tag file is damaged"));
+            response = Http::failure(500, QStringLiteral("The study's tag file is missing or damaged"));
             return done;
         }
         response = answerOf(answers, kOffers.at(offer));
