@@ -53,6 +53,7 @@ set(KDD_PUBLIC_HEADERS
   core/kddlib/previews/PreviewGenerator.h
   core/kddlib/previews/QuadrantNavigation.h
   core/kddlib/tagfile/ByteMap.h
+  core/kddlib/tagfile/ChangeFault.h
   core/kddlib/tagfile/StudyRecord.h
   core/kddlib/tagfile/TagFile.h
   core/kddlib/tagfile/TagFileSettings.h

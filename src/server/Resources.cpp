@@ -55,7 +55,8 @@ std::vector<std::unique_ptr<DicomWeb::Resource>> makeResources(ServedArchive& ar
             std::make_unique<StoreResource>(*archive.arrivals, archive.sight, archive.storeLimits));
     resources.push_back(
         std::make_unique<CorrectionsResource>(*archive.studies, archive.sight, *archive.changes));
-    resources.push_back(std::make_unique<RemovalResource>(archive.catalogue, *archive.changes));
+    resources.push_back(
+        std::make_unique<RemovalResource>(*archive.studies, archive.catalogue, *archive.changes));
     return resources;
 }
 

@@ -66,7 +66,7 @@ inline bool isLacking(Arrived arrived)
     return arrived == Arrived::Held || arrived == Arrived::Stuck;
 }
 
-/// Images that have arrived and are not in their tag files yet. Called on several threads at the same time.
+/// What is known of studies and not in their tag files yet: mostly images that have arrived. Called on several threads at the same time.
 class Arrivals
 {
 public:
@@ -77,6 +77,10 @@ public:
 
     /// Brings in what this server has taken: of the study, or of all studies when that is empty.
     virtual void bringInOwn(const QByteArray& studyUID) = 0;
+
+    /// Takes over a study whose tag file does not show yet what the database was told: from now on it counts among what this
+    /// server has taken.
+    virtual void takeOver(const QByteArray& studyUID) = 0;
 };
 
 /// Knows which tag files were written, and by what each was recognised then. Called on several threads at the same time.

@@ -101,6 +101,13 @@ bool resolveStudies(const CorrectionRequest& request, QAData& job)
     return false;
 }
 
+const char* failureOf(ChangeFault fault, bool isPreview)
+{
+    if (fault == ChangeFault::Kept)
+        return "The correction is kept, but not shown yet";
+    return isPreview ? "The correction cannot be made" : "The correction is not made";
+}
+
 /// What would change: each value once, with how many images have it.
 void printChanges(const QJsonArray& changes, bool isComplete)
 {
@@ -164,9 +171,7 @@ Outcome runCorrection(const GlobalOptions& options, const CorrectionRequest& req
     if (!readImages(request, job) || !resolveStudies(request, job))
         return Outcome::Failed;
     const Result result = request.isPreview ? StudyChange::preview(job) : StudyChange::correct(job);
-    if (!succeeded(result.within(
-            QStringLiteral("The correction %1 made")
-                .arg(request.isPreview ? QStringLiteral("cannot be") : QStringLiteral("is not")))))
+    if (!succeeded(result.within(QString::fromLatin1(failureOf(job.outcome.fault, request.isPreview)))))
         return Outcome::Failed;
     report(options, job, request.isPreview);
     // The others are corrected, but not all that was asked for is done.

@@ -13,7 +13,7 @@ namespace Kdd
 namespace
 {
 
-using Fault = Removal::Fault;
+using Fault = ChangeFault;
 
 /// Tag files of which a new database knows nothing.
 class UnregisteredStudy : public ArchiveTest

@@ -123,7 +123,7 @@ TEST_F(RebuiltCorrections, OfAStudyThatOthersWorkOnAreRefused)
     QAData job = move({"a"}, "1", "2");
     QString message;
     EXPECT_FALSE(TagFile::applyQA(job, message));
-    EXPECT_TRUE(job.outcome.isLockedOut) << message.toStdString();
+    EXPECT_EQ(job.outcome.fault, ChangeFault::LockedOut) << message.toStdString();
     EXPECT_EQ(shown(mAll), before);
 }
 
@@ -217,7 +217,7 @@ TEST_F(RebuiltCorrections, MovesInOppositeDirectionsAtOnceLoseNothing)
         for (const char* uid : {"a", "b", "c", "z"}) {
             QAData job = move({uid}, from, to);
             QString message;
-            while (!TagFile::applyQA(job, message) && job.outcome.isLockedOut) {
+            while (!TagFile::applyQA(job, message) && job.outcome.fault == ChangeFault::LockedOut) {
             }
             EXPECT_EQ(message, QString());
         }

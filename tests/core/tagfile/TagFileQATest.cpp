@@ -181,7 +181,7 @@ TEST_F(TagFileQA, APreviewTellsWhatIsThenDoneAndTouchesNothing)
     EXPECT_EQ(job.outcome.images.at(1).changes, told.images.at(1).changes);
     job.substitutions = {{DCM_Rows, QStringLiteral("x")}};
     EXPECT_FALSE(TagFile::previewQA(job, message));
-    EXPECT_TRUE(job.outcome.isRefused);
+    EXPECT_EQ(job.outcome.fault, ChangeFault::Refused);
     EXPECT_EQ(job.outcome.refusedImage, "1");
     job = edit({"1"}, {{DCM_StudyInstanceUID, QStringLiteral("9")}});
     job.studyUID = "9";
@@ -313,7 +313,7 @@ TEST_F(TagFileQA, AMoveThatEndedBetweenTheTwoWritesKeepsWhatWasEditedMeanwhile)
     QAData job = move({"3"}, "1", "9");
     QString message;
     EXPECT_FALSE(TagFile::applyQA(job, message));
-    EXPECT_TRUE(job.outcome.isLockedOut);
+    EXPECT_EQ(job.outcome.fault, ChangeFault::LockedOut);
     EXPECT_EQ(message, QStringLiteral("The tag file of study 9 cannot be changed: others hold it"));
 }
 

@@ -33,7 +33,7 @@ TEST_F(ChangeTest, ShowsACorrectionInEveryAnswerAtOnce)
         QString::fromUtf8(
             R"({"changed":3,"changes":[{"attributes":[{"keyword":"PatientName","new":"Roe^Jane",)"
             R"("old":"Doe^John","tag":"00100010"}],"count":3,"images":["1.2.3.1","1.2.3.2","1.2.4.1"]}],)"
-            R"("complete":true,"images":3,"moved":0,"notFound":[],"preview":false,"study":"1.2",)"
+            R"("complete":true,"images":3,"moved":0,"notFound":[],"pending":false,"preview":false,"study":"1.2",)"
             R"("url":"http://localhost/dicom-web/studies/1.2"})"));
     EXPECT_EQ(get("/studies/1.2/metadata", "If-None-Match: " + tag + "\r\n").status, 200);
     EXPECT_EQ(values("1.2", "00100010"), "Roe^Jane Roe^Jane Roe^Jane");
@@ -180,11 +180,12 @@ TEST_F(ChangeTest, RemovesWhatIsNamedAndTellsHowMuch)
     EXPECT_EQ(remove("/studies/1.9").status, 404);
     const Reply image = remove("/studies/1.2/series/1.2.3/instances/1.2.3.1");
     EXPECT_EQ(image.status, 200);
-    EXPECT_EQ(image.body.toStdString(), R"({"study":"1.2","images":1})");
+    EXPECT_EQ(image.body.toStdString(), R"({"study":"1.2","images":1,"pending":false})");
     EXPECT_EQ(values("1.2", "00080018"), "1.2.3.2 1.2.4.1");
     EXPECT_EQ(get("/studies/1.2/series/1.2.3/instances/1.2.3.1").status, 404);
     EXPECT_EQ(remove("/studies/1.2/series/1.2.3/instances/1.2.3.1").status, 404) << "again";
-    EXPECT_EQ(remove("/studies/1.2/series/1.2.4").body.toStdString(), R"({"study":"1.2","images":1})");
+    EXPECT_EQ(remove("/studies/1.2/series/1.2.4").body.toStdString(),
+              R"({"study":"1.2","images":1,"pending":false})");
     EXPECT_EQ(values("1.2", "00080018"), "1.2.3.2");
     EXPECT_EQ(remove("/studies/1.2").status, 200);
     EXPECT_EQ(get("/studies/1.2/metadata").status, 404);

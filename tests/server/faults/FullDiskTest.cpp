@@ -31,8 +31,9 @@ protected:
         script.setPermissions(QFile::ReadOwner | QFile::WriteOwner | QFile::ExeOwner);
         script.close();
         QDir().mkpath(path("store"));
-        serve({QStringLiteral("--stow"), QStringLiteral("--dicom"), QStringLiteral("127.0.0.1:0")}, "",
-              ("unshare -rm " + path("mounted").toUtf8()).constData());
+        serve({QStringLiteral("--stow"), QStringLiteral("--corrections"), QStringLiteral("--deletions"),
+               QStringLiteral("--dicom"), QStringLiteral("127.0.0.1:0")},
+              "", ("unshare -rm " + path("mounted").toUtf8()).constData());
     }
 
     /// Below the server's own disk.
@@ -60,14 +61,28 @@ protected:
         return fileContent(file(uid.constData()));
     }
 
-    int stow(const QByteArray& content) const
+    int send(const QByteArray& request, const QByteArray& type, const QByteArray& content) const
     {
         Client client(mAddress);
-        client.send(
-            "POST /dicom-web/studies HTTP/1.1\r\nHost: localhost\r\nContent-Type: application/dicom\r\n"
-            "Content-Length: " +
-            QByteArray::number(content.size()) + "\r\n\r\n" + content);
+        client.send(request + " HTTP/1.1\r\nHost: localhost\r\nContent-Type: " + type +
+                    "\r\nContent-Length: " + QByteArray::number(content.size()) + "\r\n\r\n" + content);
         return client.reply().status;
+    }
+
+    int stow(const QByteArray& content) const
+    {
+        return send("POST /dicom-web/studies", "application/dicom", content);
+    }
+
+    int correct(const QByteArray& value) const
+    {
+        return send("POST /dicom-web/studies/1.2/corrections?all=true", "application/json",
+                    "{\"tags\": [{\"tag\": \"00102000\", \"value\": \"" + value + "\"}]}");
+    }
+
+    int remove(const QByteArray& uid) const
+    {
+        return send("DELETE /dicom-web/studies/1.2/series/1.2.3/instances/" + uid, "text/plain", {});
     }
 
     int associate(const QByteArray& uid, const QByteArray& content) const
@@ -76,6 +91,8 @@ protected:
         caller.associate({{kCapture, {UID_LittleEndianExplicitTransferSyntax}}});
         return caller.store(kCapture, uid, datasetOf(content));
     }
+
+    bool isShown(const QByteArray& word) const { return get("studies/1.2/metadata").body.contains(word); }
 
     int found() const { return QJsonDocument::fromJson(get("studies/1.2/instances").body).array().size(); }
 
@@ -123,6 +140,37 @@ TEST_F(FullDisk, TellsTheTruthWhereverTheRoomEnds)
         EXPECT_EQ(i % 2 == 0 ? stow(content) : associate(uid, content), i % 2 == 0 ? 200 : 0) << i;
         EXPECT_EQ(found(), ++stored) << i;
     }
+    EXPECT_EQ(end(), 0);
+}
+
+/// What succeeded is shown at once, what is kept as soon as there is room, what failed never.
+TEST_F(FullDisk, TellsOfChangesWhatBecomesOfThem)
+{
+    const QByteArray words(9000, 'x');
+    constexpr int kRounds = 24;
+    const auto uidOf = [](int i) { return "1.2.3." + QByteArray::number(100 + i); };
+    for (int i = 0; i <= kRounds; ++i)
+        ASSERT_EQ(stow(fileOf(uidOf(i), 30)), 200);
+    QMap<int, int> corrections;  // how often each status was the answer
+    QMap<int, int> removals;
+    for (int i = 0; i < kRounds; ++i) {
+        const QByteArray word = "word" + QByteArray::number(i) + '.';
+        fill(32768 * i);
+        const int corrected = correct(word + words);
+        giveRoom();
+        const auto isCorrected = [&] { return isShown(word); };
+        EXPECT_EQ(corrected == 202 ? comesTrue(isCorrected) : isCorrected(), corrected < 300)
+            << i << ' ' << corrected;
+        fill(4096 * i);
+        const int removed = remove(uidOf(i));
+        giveRoom();
+        const auto isGone = [&] { return !isShown(uidOf(i)); };
+        EXPECT_EQ(removed == 202 ? comesTrue(isGone) : isGone(), removed < 300) << i << ' ' << removed;
+        ++corrections[corrected];
+        ++removals[removed];
+    }
+    EXPECT_TRUE(corrections.contains(200) && corrections.contains(503));
+    EXPECT_TRUE(removals.contains(200) && removals.contains(202) && removals.contains(503));
     EXPECT_EQ(end(), 0);
 }
 

@@ -9,6 +9,7 @@
 #include "platform/base/LogFile.h"
 #include "platform/base/Stopwatch.h"
 #include "platform/os/FileStatus.h"
+#include "platform/os/JournaledWrite.h"
 
 #include <algorithm>
 
@@ -60,17 +61,12 @@ Removal absent(const ArchiveNode& node)
         reason = QStringLiteral("Study %1 has no %2 %3")
                      .arg(study, isSeries ? QStringLiteral("series") : QStringLiteral("image"),
                           QString::fromUtf8(isSeries ? node.series : node.image));
-    return {Removal::Fault::Absent, Result::failure(reason), 0};
-}
-
-Removal failed(const Result& result)
-{
-    return {result.good() ? Removal::Fault::None : Removal::Fault::Failed, result, 0};
+    return {ChangeFault::Absent, Result::failure(reason), 0};
 }
 
 Removal unasked(const Result& result)
 {
-    return {Removal::Fault::Unasked, result, 0};
+    return {ChangeFault::Unasked, result, 0};
 }
 
 Result unchanged(const QByteArray& studyUID, const TagFile& file)
@@ -83,10 +79,11 @@ Result unchanged(const QByteArray& studyUID, const TagFile& file)
 Removal removeUnregistered(const ArchiveNode& node)
 {
     TagFile file;
-    if (presenceOf(TagFile::cacheFilePathForStudy(node.study.constData())) == FilePresence::Absent)
+    const QString path = TagFile::cacheFilePathForStudy(node.study.constData());
+    if (presenceOf(path) == FilePresence::Absent)
         return absent(node);
     if (!file.readWhenFreeForStudy(node.study.constData(), true)) {
-        const auto fault = file.wasLockedOut() ? Removal::Fault::LockedOut : Removal::Fault::Failed;
+        const auto fault = file.wasLockedOut() ? ChangeFault::LockedOut : ChangeFault::Failed;
         return {fault, unchanged(node.study, file), 0};
     }
     if (!isHeld(node, file))
@@ -94,9 +91,12 @@ Removal removeUnregistered(const ArchiveNode& node)
     const int before = file.imagesByUID().size();
     takeOut(node, file);
     const int left = file.imagesByUID().size();
-    if (!file.writeCacheFile())
-        return failed(unchanged(node.study, file));
-    return {Removal::Fault::None, {}, before - left};
+    if (file.writeCacheFile())
+        return {ChangeFault::None, {}, before - left};
+    if (!hasJournal(path))
+        return {ChangeFault::Failed, unchanged(node.study, file), 0};
+    const QString reason = file.failure() + QStringLiteral("; whoever opens the tag file next completes it");
+    return {ChangeFault::Kept, Result::failure(reason), before - left};
 }
 
 /// Each attempt waits some 0.4 seconds for others.
@@ -105,7 +105,7 @@ Result tryFor(int patienceMs, bool (*attempt)(QAData&, QString&), QAData& job)
     const Stopwatch waiting;
     QString reason;
     bool isDone = attempt(job, reason);
-    while (!isDone && job.outcome.isLockedOut && waiting.elapsed() < patienceMs)
+    while (!isDone && job.outcome.fault == ChangeFault::LockedOut && waiting.elapsed() < patienceMs)
         isDone = attempt(job, reason);
     return isDone ? Result() : Result::failure(reason);
 }
@@ -136,7 +136,7 @@ Removal StudyChange::removeRegistered(const ArchiveNode& node, int patienceMs)
     Kxg::StudyContents contents;
     Result result = mCatalogue.claim(node.study, patienceMs, claim);
     if (result.good() && claim == nullptr)
-        return {Removal::Fault::LockedOut,
+        return {ChangeFault::LockedOut,
                 Result::failure(QStringLiteral("Study %1 is being worked on by another process")
                                     .arg(QString::fromUtf8(node.study))),
                 0};
@@ -163,7 +163,7 @@ Removal StudyChange::removeRegistered(const ArchiveNode& node, int patienceMs)
     // What had changed before this removal is not in the tag file yet,
     // so taking images out of that would not do.
     result = (contents.changes.isEmpty() ? completion.reduce(*claim) : completion.build(*claim)).result;
-    return {result.good() ? Removal::Fault::None : Removal::Fault::Failed, result, images};
+    return {result.good() ? ChangeFault::None : ChangeFault::Kept, result, images};
 }
 
 Result StudyChange::forget(const ArchiveNode& node)

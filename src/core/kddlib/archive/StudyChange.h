@@ -1,5 +1,6 @@
 #pragma once
 
+#include "kddlib/tagfile/ChangeFault.h"
 #include "platform/base/Export.h"
 #include "platform/base/Result.h"
 #include "platform/database/Catalogue.h"
@@ -23,15 +24,7 @@ struct ArchiveNode
 /// What became of a removal.
 struct Removal
 {
-    enum class Fault {
-        None,
-        Absent,     ///< there is no such node
-        LockedOut,  ///< others work on the study all the time: try again
-        Failed,     ///< it is not removed whole; a repeat completes it
-        Unasked,    ///< the database failed, and nothing is removed: try again
-    };
-
-    Fault fault = Fault::None;
+    ChangeFault fault = ChangeFault::None;
     Result result;
     int images = 0;  ///< that are gone
 };

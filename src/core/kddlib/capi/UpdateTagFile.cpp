@@ -60,11 +60,11 @@ bool applyJob(const Xml& jobXml, QAData& job)
     QString message;
     if (!parse(jobXml, job, message))
         return fail("Error reading UPQ job XML", message);
-    if (!TagFile::applyQA(job, message))
-        return fail("Error updating tag file", message);
-    // Only when the correction is done: before that the entries are not stale.
-    removeStaleEntries(job.cacheEntries);
-    return true;
+    const bool isApplied = TagFile::applyQA(job, message);
+    // Only where the correction is done, or will be: before that the entries are not stale.
+    if (isApplied || job.outcome.fault == ChangeFault::Kept)
+        removeStaleEntries(job.cacheEntries);
+    return isApplied || fail("Error updating tag file", message);
 }
 
 /// A wide text as UTF-8. Null stays null, and empty does not become null.

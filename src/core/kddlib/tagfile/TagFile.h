@@ -221,10 +221,11 @@ public:
     /// there before the files are written, so that every later build makes it again.
     ///
     /// False, with the reason in `message`, when a study could not be claimed, a file could not be held, read or written,
-    /// the database could not be reached, or when a value cannot be replaced without losing something. Then both files are
-    /// as they were, but for one case that the message tells: a move whose images stand in both studies. As after the
-    /// death of the process in the middle, running the job again completes it. A job whose old study is its study becomes
-    /// an edit.
+    /// the database could not be reached, or when a value cannot be replaced without losing something; `fault` in the
+    /// outcome tells which. Then both files are as they were, unless the fault is `Kept`: what was to be written is in a
+    /// file's journal or in the database and will be shown. Of a move that no database knows of images may stand in both
+    /// studies, which the message tells; as after the death of the process in the middle, running the job again completes
+    /// it. A job whose old study is its study becomes an edit.
     static bool applyQA(QAData& job, QString& message);
 
     /// Tells in the job's outcome what `applyQA` would do now, and why it would refuse, by doing all of it but for keeping

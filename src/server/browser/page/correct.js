@@ -165,7 +165,8 @@ class CorrectionForm {
     try {
       const report = await applyCorrection(this.study.study, job);
       const words = summary(report, true);
-      this.tell(h('h2', {}, 'Corrected'), h('p', { role: 'status' }, words),
+      this.tell(h('h2', {}, report.pending ? 'Kept' : 'Corrected'), h('p', { role: 'status' }, words),
+        report.pending && h('p', { class: 'note' }, 'The server could not write all of it yet. It is kept, and shown as soon as the server can.'),
         report.changes.slice(0, shownGroups).map((one) => group(report.study, one)),
         h('div', { class: 'actions' }, h('a', { class: 'button main', href: studyLink(report.study) }, report.oldStudy ? 'To the new study' : 'To the study'),
           h('a', { class: 'button', href: studyLink(report.study, '/corrections') }, 'All corrections')));

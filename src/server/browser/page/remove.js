@@ -46,6 +46,7 @@ class RemovalForm {
       const isAll = report.images >= this.study.images;
       this.element.remove();
       this.tell(h('h2', {}, 'Deleted'), h('p', { role: 'status' }, `${amount(report.images, 'image')} ${report.images === 1 ? 'is' : 'are'} gone.`),
+        ...(report.pending ? [h('p', { class: 'note' }, 'The server could not write all of it yet, and goes on as soon as it can.')] : []),
         h('div', { class: 'actions' }, h('a', { class: 'button main', href: isAll ? '#/' : studyLink(this.study.study) }, isAll ? 'To the studies' : 'To the study')));
     } catch (fault) {
       if (fault.kind === undefined) console.error(fault);

@@ -99,9 +99,12 @@ Http::Response CorrectionBody::correct()
     const int patience = mTurns.rules().patienceMs();
     const Result result =
         mOrder.isPreview ? StudyChange::preview(mJob, patience) : StudyChange::correct(mJob, patience);
-    if (result.bad())
-        return failed(result);
     const QAData::Outcome& outcome = mJob.outcome;
+    const bool isKept = outcome.fault == ChangeFault::Kept;
+    if (isKept)
+        expect(result);
+    else if (result.bad())
+        return failed(result);
     QSet<QByteArray> missing(mJob.images.cbegin(), mJob.images.cend());
     missing.intersect(QSet<QByteArray>(outcome.notFound.cbegin(), outcome.notFound.cend()));
     const bool hasImages = outcome.asked > missing.size();
@@ -111,7 +114,8 @@ Http::Response CorrectionBody::correct()
     std::shared_ptr<const ServedStudy> study;
     if (!hasImages && mStudies.find(from, study) == Presence::Missing)
         return Http::failure(500, QStringLiteral("The study's tag file is missing"));
-    Http::Response response = Http::textResponse(hasImages ? 200 : 404, "application/json",
+    const int done = isKept ? 202 : 200;
+    Http::Response response = Http::textResponse(hasImages ? done : 404, "application/json",
                                                  correctionReport(mJob, mOrder.root, mOrder.isPreview));
     response.addHeader("Cache-Control", "no-store");
     if (!mOrder.isPreview) {
@@ -122,12 +126,25 @@ Http::Response CorrectionBody::correct()
     return response;
 }
 
+/// What is kept and not shown yet is not left to whoever comes next, where this server completes studies.
+void CorrectionBody::expect(const Result& reason) const
+{
+    LogFile::errorf("Request %s: the correction of study %s is not shown yet: %s", mOrder.id.constData(),
+                    mJob.studyUID.constData(), qUtf8Printable(reason.text()));
+    if (mStudies.arrivals() == nullptr)
+        return;
+    for (const QByteArray& study : {mJob.studyUID, mJob.oldStudyUID}) {
+        if (!study.isEmpty())
+            mStudies.arrivals()->takeOver(study);
+    }
+}
+
 /// What is refused is told in words to whoever asked for it; of what failed here the words are for the log.
 Http::Response CorrectionBody::failed(const Result& result) const
 {
-    if (mJob.outcome.isLockedOut)
+    if (mJob.outcome.fault == ChangeFault::LockedOut)
         return studyIsBusy();
-    if (mJob.outcome.isRefused) {
+    if (mJob.outcome.fault == ChangeFault::Refused) {
         QString reason = result.text();
         const QByteArray& image = mJob.outcome.refusedImage;
         if (!isUID(image) && !image.isEmpty())
@@ -136,7 +153,7 @@ Http::Response CorrectionBody::failed(const Result& result) const
     }
     LogFile::errorf("Request %s: study %s is not corrected: %s", mOrder.id.constData(),
                     mJob.studyUID.constData(), qUtf8Printable(result.text()));
-    if (mJob.outcome.isUnasked)
+    if (mJob.outcome.fault == ChangeFault::Unasked)
         return databaseIsAway();
     return Http::failure(500, QStringLiteral("The correction could not be made; the server's log tells why"));
 }

@@ -51,6 +51,7 @@ private:
     bool mayMove() const;
     Http::Response correct();
     Http::Response failed(const Result& result) const;
+    void expect(const Result& reason) const;
 
     StudyShelf& mStudies;
     const StudySight& mSight;

@@ -98,6 +98,7 @@ QByteArray correctionReport(const QAData& job, const QByteArray& root, bool isPr
         {QStringLiteral("study"), study},
         {QStringLiteral("url"), QString::fromUtf8(root) + QStringLiteral("/studies/") + study},
         {QStringLiteral("preview"), isPreview},
+        {QStringLiteral("pending"), job.outcome.fault == ChangeFault::Kept},
         {QStringLiteral("images"), job.outcome.asked},
         {QStringLiteral("changed"), job.outcome.changed},
         {QStringLiteral("moved"), job.outcome.moved},

@@ -10,11 +10,11 @@ namespace Kdd::DicomWeb
 namespace
 {
 
-Http::Response removed(const QByteArray& study, int images)
+Http::Response removed(const QByteArray& study, int images, bool isPending)
 {
-    Http::Response response =
-        Http::textResponse(200, "application/json",
-                           "{\"study\":\"" + study + "\",\"images\":" + QByteArray::number(images) + '}');
+    const QByteArray report = "{\"study\":\"" + study + "\",\"images\":" + QByteArray::number(images) +
+                              ",\"pending\":" + (isPending ? "true" : "false") + '}';
+    Http::Response response = Http::textResponse(isPending ? 202 : 200, "application/json", report);
     response.addHeader("Cache-Control", "no-store");
     response.effect = Http::Effect{{study}, images};
     return response;
@@ -49,19 +49,25 @@ Http::Response RemovalResource::remove(const Http::Request& request, const Resou
         return removal.result;
     });
     if (asked.good())
-        return removed(path.study, removal.images);
-    if (removal.fault == Removal::Fault::Absent)
+        return removed(path.study, removal.images, false);
+    if (removal.fault == ChangeFault::Absent)
         return Http::failure(404, asked.text());
-    if (removal.fault == Removal::Fault::LockedOut)
+    if (removal.fault == ChangeFault::LockedOut)
         return studyIsBusy();
-    if (removal.result.good() || removal.fault == Removal::Fault::Unasked) {
+    if (removal.result.good() || removal.fault == ChangeFault::Unasked) {
         LogFile::errorf("Request %s: nothing is removed of study %s: %s", request.id.constData(),
                         path.study.constData(), qUtf8Printable(asked.text()));
         return databaseIsAway();
     }
-    LogFile::errorf("Request %s: nothing, or not all, is removed of study %s: %s", request.id.constData(),
-                    path.study.constData(), qUtf8Printable(asked.text()));
-    return Http::failure(500, QStringLiteral("It could not be removed whole; asking again goes on with it"));
+    const bool isKept = removal.fault == ChangeFault::Kept;
+    LogFile::errorf("Request %s: %s removed of study %s: %s", request.id.constData(),
+                    isKept ? "not all is yet" : "nothing is", path.study.constData(),
+                    qUtf8Printable(asked.text()));
+    if (isKept && mStudies.arrivals() != nullptr)
+        mStudies.arrivals()->takeOver(path.study);
+    if (isKept)
+        return removed(path.study, removal.images, true);
+    return Http::failure(500, QStringLiteral("It could not be removed; the server's log tells why"));
 }
 
 }  // namespace Kdd::DicomWeb

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "kddlib/tagfile/ChangeFault.h"
 #include "kddlib/tagfile/qa/QAAudit.h"
 #include "platform/base/Export.h"
 
@@ -54,9 +55,7 @@ struct KDD_EXPORT QAData
         int moved = 0;               ///< images that are now in another study, series or under another UID
         QList<QByteArray> notFound;  ///< images and series that no study concerned holds
         QVector<QAImageOutcome> images;  ///< those that are changed
-        bool isLockedOut = false;        ///< it failed because others held a study all the time: try again
-        bool isRefused = false;   ///< it failed because of what it asks of these images: it would again
-        bool isUnasked = false;   ///< it failed because the image database did; nothing is changed: try again
+        ChangeFault fault = ChangeFault::None;
         QByteArray refusedImage;  ///< the image that the reason names; empty: none
     };
 

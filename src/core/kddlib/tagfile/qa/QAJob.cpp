@@ -23,13 +23,8 @@ namespace
 
 const char* const kCategory = "TagFileQA";
 const char* const kInBothStudies = "until the job is run again its images may stand in both studies";
+const char* const kUntilBuilt = "until these are built its images may stand in both studies";
 const char* const kPromised = "whoever opens the tag file next makes it";
-
-/// A failure with what it leaves behind.
-Result leaving(const QString& reason, const QString& left)
-{
-    return Result::failure(reason + QStringLiteral("; ") + left);
-}
 
 /// Whether an image inherits what the node holds.
 bool isSeenBelow(const TagMap& node, const DcmTagKey& key)
@@ -75,6 +70,14 @@ QAJob::~QAJob()
 
 Result QAJob::run()
 {
+    const Result result = attempt();
+    if (result.bad() && mJob.outcome.fault == ChangeFault::None)
+        mJob.outcome.fault = ChangeFault::Failed;
+    return result;
+}
+
+Result QAJob::attempt()
+{
     const Stopwatch total;
     Result result = prepare();
     if (result.good())
@@ -87,7 +90,8 @@ Result QAJob::run()
     mDestinationHasLabels = hasLabels(mDestination.tree().isEmpty() ? mSource.tree() : mDestination.tree());
     selectImages();
     result = applyToImages();
-    mJob.outcome.isRefused = result.bad();
+    if (result.bad())
+        mJob.outcome.fault = ChangeFault::Refused;
     const Stopwatch writing;
     if (result.good() && (mJob.outcome.changed > 0 || mJob.outcome.moved > 0))
         result = mIsPreview ? recorded(mRecord.plan()) : write();
@@ -113,9 +117,10 @@ Result QAJob::prepare()
         mJob.oldStudyUID.clear();
     mIsMove = !mJob.oldStudyUID.isEmpty();
     Result result = check(mJob);
-    mJob.outcome.isRefused = result.bad();
-    if (result.bad())
+    if (result.bad()) {
+        mJob.outcome.fault = ChangeFault::Refused;
         return result;
+    }
     auditTime(mJob.timestamp, mTime);
     if (!mJob.login.isEmpty())
         mTime += QLatin1Char(' ') + QString::fromLatin1(mJob.login);
@@ -133,8 +138,7 @@ Result QAJob::prepare()
 Result QAJob::open()
 {
     Result result = mIsPreview ? mRecord.consult(mJob) : mRecord.claim(mJob);
-    mJob.outcome.isLockedOut = mRecord.wasLockedOut();
-    mJob.outcome.isUnasked = mRecord.wasUnasked();
+    mJob.outcome.fault = mRecord.fault();
     if (result.good() && !mIsPreview)
         return hold();
     if (result.good())
@@ -153,7 +157,8 @@ Result QAJob::look(StoredStudy& study, const QByteArray& studyUID)
     const Result read = study.read(path, studyUID.constData(), false, StoredStudy::Reader::Serving);
     if (read.good() || presenceOf(path) == FilePresence::Absent)
         return {};
-    mJob.outcome.isLockedOut = study.wasLockedOut();
+    if (study.wasLockedOut())
+        mJob.outcome.fault = ChangeFault::LockedOut;
     return read.within(
         QStringLiteral("The tag file of study %1 cannot be read").arg(QString::fromLatin1(studyUID)));
 }
@@ -183,7 +188,8 @@ Result QAJob::hold(StoredStudy& study, const QByteArray& studyUID, IfAbsent ifAb
     Result held = study.hold(studyUID, ifAbsent);
     if (held.good())
         return held;
-    mJob.outcome.isLockedOut = study.wasLockedOut();
+    if (study.wasLockedOut())
+        mJob.outcome.fault = ChangeFault::LockedOut;
     return held.within(
         QStringLiteral("The tag file of study %1 cannot be changed").arg(QString::fromLatin1(studyUID)));
 }
@@ -214,10 +220,8 @@ void QAJob::tidy()
 /// What became of keeping the changes.
 Result QAJob::recorded(const Result& result)
 {
-    mJob.outcome.isLockedOut = mRecord.wasLockedOut();
-    mJob.outcome.isUnasked = mRecord.wasUnasked();
+    mJob.outcome.fault = mRecord.fault();
     mJob.outcome.refusedImage = mRecord.refusedImage();
-    mJob.outcome.isRefused = !mRecord.refusedImage().isEmpty();
     return result;
 }
 
@@ -234,9 +238,7 @@ Result QAJob::write()
     if (result.bad()) {
         // A journal is a promise: whoever opens the destination next gives it what was to be written. So the database keeps
         // it too, or the file would show a correction of which nobody knows.
-        return mDestination.file().hasJournal()
-                   ? leaving(result.text(), QLatin1String(mIsMove ? kInBothStudies : kPromised))
-                   : failWriting(result.text());
+        return mDestination.file().hasJournal() ? leaveKept(result.text()) : failWriting(result.text());
     }
     if (mIsMove)
         result = writeSource();
@@ -257,7 +259,7 @@ Result QAJob::writeSource()
         return written;
     // Of a file that the system would not remove nobody knows whether it is gone.
     if (isEmpty || !takeBack())
-        return leaving(written.text(), QLatin1String(kInBothStudies));
+        return leaveKept(written.text());
     return failWriting(written.text());
 }
 
@@ -265,7 +267,19 @@ Result QAJob::writeSource()
 Result QAJob::failWriting(const QString& reason)
 {
     const Result takenBack = mRecord.takeBack();
-    return takenBack.good() ? Result::failure(reason) : leaving(reason, takenBack.text());
+    if (takenBack.good())
+        return Result::failure(reason);
+    mJob.outcome.fault = ChangeFault::Kept;
+    return Result::failure(reason + QStringLiteral("; ") + takenBack.text());
+}
+
+/// With files that are not what they were, or will not be. Only the database sees to both files of a move.
+Result QAJob::leaveKept(const QString& reason)
+{
+    const bool isCompleted = !mIsMove || mRecord.isRecorded();
+    const char* const left = !mIsMove ? kPromised : isCompleted ? kUntilBuilt : kInBothStudies;
+    mJob.outcome.fault = isCompleted ? ChangeFault::Kept : ChangeFault::Failed;
+    return Result::failure(reason + QStringLiteral("; ") + QLatin1String(left));
 }
 
 /// Makes the destination what it was, because the source could not be written. But what the source has a journal for

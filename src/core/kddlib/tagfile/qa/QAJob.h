@@ -36,8 +36,8 @@ public:
     QAJob(const QAJob&) = delete;
     QAJob& operator=(const QAJob&) = delete;
 
-    /// On failure both files are as they were, but for one case that the reason tells: a move whose images stand in both
-    /// studies. As after the death of the process in the middle, running the job again completes it.
+    /// On failure both files are as they were, but where the fault is `Kept`, and of a move whose images stand in both
+    /// studies, which the reason tells. As after the death of the process in the middle, running the job again completes it.
     Result run();
 
 private:
@@ -59,6 +59,7 @@ private:
 
     using Series = std::pair<StudyTree*, QByteArray>;
 
+    Result attempt();
     Result prepare();
     Result open();
     Result hold();
@@ -88,6 +89,7 @@ private:
     Result write();
     Result writeSource();
     Result failWriting(const QString& reason);
+    Result leaveKept(const QString& reason);
     bool takeBack();
 
     Result failAt(const QByteArray& key, const QString& reason)

@@ -126,14 +126,15 @@ Result QARecord::claim(const QAData& job)
 
 Result QARecord::lockedOut(const QString& reason)
 {
-    mIsLockedOut = true;
+    mFault = ChangeFault::LockedOut;
     return Result::failure(reason);
 }
 
 /// What the database said.
 Result QARecord::asked(const Result& result)
 {
-    mIsUnasked = mIsUnasked || result.bad();
+    if (result.bad())
+        mFault = ChangeFault::Unasked;
     return result;
 }
 
@@ -266,7 +267,7 @@ Result QARecord::plan()
             findShown(change.holder->studyInstanceUID(), change.keyNow, change.before) != nullptr)
             continue;
         const bool isKnown = identify(change, former);
-        if (!isKnown && mIsUnasked) {
+        if (!isKnown && mFault == ChangeFault::Unasked) {
             result =
                 Result::failure(QStringLiteral("the image database does not tell of earlier corrections"));
             break;
@@ -280,6 +281,7 @@ Result QARecord::plan()
             if (mStudies.find(change.studyUID) == mStudies.end())
                 return lockedOut(reason);
             mRefusedImage = change.key;
+            mFault = ChangeFault::Refused;
             // So that the job can be run when the build is done.
             if (mIsClaimed)
                 mCatalogue->requestBuild({change.studyUID}, Kxg::Catalogue::IfGone::PassOver);

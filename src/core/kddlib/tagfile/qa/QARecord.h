@@ -1,5 +1,6 @@
 #pragma once
 
+#include "kddlib/tagfile/ChangeFault.h"
 #include "kddlib/tagfile/qa/ImageIdentity.h"
 #include "kddlib/tagfile/qa/QAAudit.h"
 #include "platform/base/Result.h"
@@ -62,11 +63,12 @@ public:
     /// The image because of which nothing was recorded; empty: there is none.
     const QByteArray& refusedImage() const { return mRefusedImage; }
 
-    /// Whether `claim` or `record` failed because others only have to finish what they do: then try again.
-    bool wasLockedOut() const { return mIsLockedOut; }
+    /// Why `claim`, `consult`, `plan` or `record` failed: others only have to finish what they do, the database could not be
+    /// asked or written, or `refusedImage` stands in the way.
+    ChangeFault fault() const { return mFault; }
 
-    /// Whether one of them failed because the database could not be asked or written.
-    bool wasUnasked() const { return mIsUnasked; }
+    /// Whether the database has something of the job, which `takeBack` would undo.
+    bool isRecorded() const { return !mRecorded.empty(); }
 
     /// Makes what `record` did undone. On failure what was recorded stays.
     Result takeBack();
@@ -107,8 +109,7 @@ private:
     QByteArray mRefusedImage;
     bool mIsClaimed = false;
     bool mIsFinal = false;  // taking it back would do more than that
-    bool mIsLockedOut = false;
-    bool mIsUnasked = false;
+    ChangeFault mFault = ChangeFault::None;
 };
 
 }  // namespace Kdd
