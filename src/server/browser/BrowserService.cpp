@@ -110,14 +110,13 @@ Http::Response BrowserService::lookAt(const QByteArray& uid, const Look& look) c
     // Whoever uploads looks at once at what came of it.
     if (arrivals != nullptr)
         arrivals->bringInOwn(uid);
-    DicomWeb::Presence presence = mShelf.find(uid, study);
-    if (study == nullptr && presence != DicomWeb::Presence::Held && arrivals != nullptr) {
-        const DicomWeb::Arrived arrived = arrivals->bringIn(uid);
-        if (arrived == DicomWeb::Arrived::Brought)
-            presence = mShelf.find(uid, study);
-        else if (DicomWeb::isLacking(arrived))
-            presence = DicomWeb::Presence::Held;
-    }
+    DicomWeb::Presence presence = DicomWeb::Presence::Absent;
+    const auto isThere = [&] {
+        presence = mShelf.find(uid, study);
+        return presence == DicomWeb::Presence::Held || study != nullptr;
+    };
+    if (DicomWeb::isLackingAfter(isThere, uid, arrivals))
+        presence = DicomWeb::Presence::Held;
     if (presence != DicomWeb::Presence::Found)
         return notThere(presence);
     return study->look([&](const TagFile& file) { return look(file, study->version()); });

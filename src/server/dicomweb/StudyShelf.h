@@ -1,5 +1,6 @@
 #pragma once
 
+#include "server/dicomweb/Arrivals.h"
 #include "server/http/CacheCount.h"
 
 #include <QByteArray>
@@ -50,37 +51,6 @@ enum class Presence {
     Held,     ///< others hold it longer than the site's patience; asking again makes sense
     Damaged,  ///< told in the log
     Missing,  ///< there is no tag file, though there was one and images are registered; told in the log
-};
-
-/// What became of images that have arrived.
-enum class Arrived {
-    Nothing,  ///< none wait
-    Brought,  ///< the tag file may show more now
-    Held,     ///< others work on the study, or the database cannot be asked: they can be brought in soon
-    Stuck,    ///< nor soon: a file of the study cannot be read or written
-};
-
-/// Whether what is not found may be there all the same.
-inline bool isLacking(Arrived arrived)
-{
-    return arrived == Arrived::Held || arrived == Arrived::Stuck;
-}
-
-/// What is known of studies and not in their tag files yet: mostly images that have arrived. Called on several threads at the same time.
-class Arrivals
-{
-public:
-    virtual ~Arrivals() = default;
-
-    /// Brings in what has arrived of the study, whichever server took it.
-    virtual Arrived bringIn(const QByteArray& studyUID) = 0;
-
-    /// Brings in what this server has taken: of the study, or of all studies when that is empty.
-    virtual void bringInOwn(const QByteArray& studyUID) = 0;
-
-    /// Takes over a study whose tag file does not show yet what the database was told: from now on it counts among what this
-    /// server has taken.
-    virtual void takeOver(const QByteArray& studyUID) = 0;
 };
 
 /// Knows which tag files were written, and by what each was recognised then. Called on several threads at the same time.

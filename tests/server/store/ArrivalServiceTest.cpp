@@ -106,6 +106,22 @@ TEST_F(ArrivalServiceTest, BringsInWhatCameToAnotherOneWhileItWasAtWork)
     EXPECT_EQ(one->bringIn("1.2"), Arrived::Nothing);
 }
 
+TEST_F(ArrivalServiceTest, FindsWhatAnotherThreadBroughtInSinceTheFirstLook)
+{
+    const auto service = make();
+    store(*service, "1.2.3.1");
+    ASSERT_EQ(service->bringIn("1.2"), Arrived::Brought);
+    store(*service, "1.2.3.2");
+    bool isThere = false;
+    const auto look = [&] {
+        isThere = shown() == 2;
+        service->bringIn("1.2");
+        return isThere;
+    };
+    EXPECT_FALSE(isLackingAfter(look, "1.2", service.get()));
+    EXPECT_TRUE(isThere);
+}
+
 TEST_F(ArrivalServiceTest, TellsWhetherItCanSoonBeHad)
 {
     const Setting patience("KDD_READ_PATIENCE", "400");

@@ -68,14 +68,13 @@ Http::Response MetadataResource::answer(const Http::Request& request, const Reso
     Arrivals* const arrivals = mStudies.arrivals();
     if (arrivals != nullptr)
         arrivals->bringInOwn(path.study);
-    Http::Response response = look(request, metadata);
-    // What is asked for may have arrived at another server a moment ago, and a tag file that is no good be made anew with it.
-    const bool mayArrive = response.status == 404 || response.status == 500;
-    const Arrived arrived =
-        mayArrive && arrivals != nullptr ? arrivals->bringIn(path.study) : Arrived::Nothing;
-    if (arrived == Arrived::Brought)
+    Http::Response response;
+    const auto isThere = [&] {
         response = look(request, metadata);
-    return isLacking(arrived) ? notThere(Presence::Held) : std::move(response);
+        // A tag file that is no good may be made anew with what has arrived.
+        return response.status != 404 && response.status != 500;
+    };
+    return isLackingAfter(isThere, path.study, arrivals) ? notThere(Presence::Held) : std::move(response);
 }
 
 Http::Response MetadataResource::look(const Http::Request& request, const MetadataRequest& metadata)

@@ -21,16 +21,14 @@ bool shows(const ServedStudy& study, const ResourcePath& path)
 
 Verdict findStudy(StudyShelf& shelf, const ResourcePath& path, std::shared_ptr<const ServedStudy>& study)
 {
-    Presence presence = shelf.find(path.study, study);
-    // What is asked for may have arrived a moment ago, and a tag file that is no good be made anew with it.
-    const bool mayHaveArrived = presence != Presence::Held && (study == nullptr || !shows(*study, path));
-    if (mayHaveArrived && shelf.arrivals() != nullptr) {
-        const Arrived arrived = shelf.arrivals()->bringIn(path.study);
-        if (arrived == Arrived::Brought)
-            presence = shelf.find(path.study, study);
-        else if (isLacking(arrived))
-            presence = Presence::Held;
-    }
+    Presence presence = Presence::Absent;
+    const auto isThere = [&] {
+        presence = shelf.find(path.study, study);
+        // A tag file that is no good may be made anew with what has arrived.
+        return presence == Presence::Held || (study != nullptr && shows(*study, path));
+    };
+    if (isLackingAfter(isThere, path.study, shelf.arrivals()))
+        presence = Presence::Held;
     switch (presence) {
     case Presence::Found:
         return {};

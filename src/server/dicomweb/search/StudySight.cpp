@@ -23,14 +23,13 @@ Result StudySight::find(const Limits& limits, const QByteArray& studyUID,
 Sight StudySight::look(const Limits& limits, const QByteArray& studyUID) const
 {
     std::vector<Kxg::FoundStudy> found;
-    Result result = find(limits, studyUID, found);
-    // By what it is known may have arrived a moment ago.
-    Arrived arrived = Arrived::Nothing;
-    if (result.good() && found.empty() && mShelf.arrivals() != nullptr)
-        arrived = mShelf.arrivals()->bringIn(studyUID);
-    if (arrived == Arrived::Brought)
+    Result result;
+    const auto isThere = [&] {
         result = find(limits, studyUID, found);
-    if (result.bad() || isLacking(arrived))
+        return result.bad() || !found.empty();
+    };
+    // By what it is known may have arrived a moment ago.
+    if (isLackingAfter(isThere, studyUID, mShelf.arrivals()) || result.bad())
         return Sight::Unknown;
     return found.empty() ? Sight::Hidden : Sight::Seen;
 }

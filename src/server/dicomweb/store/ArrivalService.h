@@ -1,6 +1,6 @@
 #pragma once
 
-#include "server/dicomweb/StudyShelf.h"
+#include "server/dicomweb/Arrivals.h"
 #include "server/dicomweb/store/ThreadCatalogue.h"
 
 #include <kddlib/ArrivedStudies.h>
