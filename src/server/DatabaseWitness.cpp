@@ -29,14 +29,16 @@ bool DatabaseWitness::isDamaged(const QByteArray& studyUID, const Kxg::TagFileSt
     return true;
 }
 
-/// One that was never built is not there yet; one that is being removed has no images any more.
-bool DatabaseWitness::isMissing(const QByteArray& studyUID)
+/// One that is being removed has no images any more.
+DicomWeb::Presence DatabaseWitness::whyAbsent(const QByteArray& studyUID)
 {
     Kxg::TagFileProofs proofs;
-    if (!find(studyUID, proofs) || !proofs.hasImages || proofs.last.digest.isEmpty())
-        return false;
+    if (!find(studyUID, proofs) || !proofs.hasImages)
+        return DicomWeb::Presence::Absent;
+    if (proofs.isWaiting && proofs.last.digest.isEmpty())
+        return DicomWeb::Presence::Unbuilt;
     LogFile::errorf("The tag file of study %s is missing", studyUID.constData());
-    return true;
+    return DicomWeb::Presence::Missing;
 }
 
 }  // namespace Kdd

@@ -21,7 +21,7 @@ public:
     }
 
     bool isDamaged(const QByteArray& studyUID, const Kxg::TagFileStamp& read) override;
-    bool isMissing(const QByteArray& studyUID) override;
+    DicomWeb::Presence whyAbsent(const QByteArray& studyUID) override;
 
 private:
     bool find(const QByteArray& studyUID, Kxg::TagFileProofs& proofs) const;

@@ -224,6 +224,9 @@ public:
     /// At most `limit` UIDs that begin with `prefix`, in order.
     virtual Kdd::Result findStudies(const QByteArray& prefix, int limit, QVector<QByteArray>& studyUIDs) = 0;
 
+    /// Whether there is a study of this UID.
+    virtual Kdd::Result findStudy(const QByteArray& studyUID, bool& isThere) = 0;
+
     /// The volume files of a study, by part number and path.
     virtual Kdd::Result volumeFiles(const QByteArray& studyUID, QVector<QByteArray>& paths) = 0;
 

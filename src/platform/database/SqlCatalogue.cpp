@@ -289,6 +289,14 @@ Kdd::Result SqlCatalogue::findStudies(const QByteArray& prefix, int limit, QVect
     });
 }
 
+Kdd::Result SqlCatalogue::findStudy(const QByteArray& studyUID, bool& isThere)
+{
+    return transact(Access::Read, [&] {
+        SqlRows rows = mConnection.ask("SELECT 1 FROM study WHERE uid = ?", {textValue(studyUID)});
+        isThere = rows.next();
+    });
+}
+
 Kdd::Result SqlCatalogue::volumeFiles(const QByteArray& studyUID, QVector<QByteArray>& paths)
 {
     return transact(Access::Read, [&] {

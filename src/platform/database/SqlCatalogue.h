@@ -27,6 +27,7 @@ public:
     Kdd::Result studyContents(const QByteArray& studyUID, StudyContents& contents) override;
     Kdd::Result listStudies(std::vector<StudySummary>& studies) override;
     Kdd::Result findStudies(const QByteArray& prefix, int limit, QVector<QByteArray>& studyUIDs) override;
+    Kdd::Result findStudy(const QByteArray& studyUID, bool& isThere) override;
     Kdd::Result volumeFiles(const QByteArray& studyUID, QVector<QByteArray>& paths) override;
 
     Kdd::Result requestBuild(const QVector<QByteArray>& studyUIDs, IfGone ifGone) override;

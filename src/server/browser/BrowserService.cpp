@@ -17,9 +17,6 @@ namespace
 
 constexpr const char* kMethods = "GET, HEAD, OPTIONS";
 
-// Seconds after which a study that is being written is asked for again.
-constexpr const char* kPatience = "2";
-
 // The page and its modules, and nothing else: no script or style inside the page, none from elsewhere, and no text that
 // becomes markup. What a value of a DICOM file says is then only ever shown.
 constexpr const char* kPolicy =
@@ -45,17 +42,6 @@ Http::Response methodsOnly(int status)
 Http::Response notFound()
 {
     return Http::failure(404, QStringLiteral("The study browser has nothing under this path"));
-}
-
-Http::Response notThere(DicomWeb::Presence presence)
-{
-    if (presence == DicomWeb::Presence::Absent)
-        return Http::failure(404, QStringLiteral("There is no such study"));
-    if (presence == DicomWeb::Presence::Damaged || presence == DicomWeb::Presence::Missing)
-        return Http::failure(500, QStringLiteral("The study's tag file cannot be read"));
-    Http::Response response = Http::failure(503, QStringLiteral("The study is being written; ask again"));
-    response.addHeader("Retry-After", kPatience);
-    return response;
 }
 
 }  // namespace
@@ -118,7 +104,7 @@ Http::Response BrowserService::lookAt(const QByteArray& uid, const Look& look) c
     if (DicomWeb::isLackingAfter(isThere, uid, arrivals))
         presence = DicomWeb::Presence::Held;
     if (presence != DicomWeb::Presence::Found)
-        return notThere(presence);
+        return DicomWeb::verdictOn(presence).response();
     return study->look([&](const TagFile& file) { return look(file, study->version()); });
 }
 

@@ -248,9 +248,9 @@ void StudyShelf::Private::read(Entry& entry, const QByteArray& uid, const QStrin
 
 Presence StudyShelf::Private::absence(const QByteArray& uid, const QByteArray& path) const
 {
+    const Presence why = witness != nullptr ? witness->whyAbsent(uid) : Presence::Absent;
     // A first one may have been written meanwhile, and be known before it was looked for.
-    return witness != nullptr && witness->isMissing(uid) && stateOf(path).isAbsent() ? Presence::Missing
-                                                                                     : Presence::Absent;
+    return stateOf(path).isAbsent() ? why : Presence::Absent;
 }
 
 Presence StudyShelf::Private::look(const QByteArray& uid, bool needsTree, QByteArray& version,
@@ -276,7 +276,7 @@ Presence StudyShelf::Private::look(const QByteArray& uid, bool needsTree, QByteA
             study = studyOf(*entry);
         }
     }
-    if (presence == Presence::Absent || presence == Presence::Missing)
+    if (presence == Presence::Absent || presence == Presence::Unbuilt || presence == Presence::Missing)
         forget(uid);
     trim();
     return presence;

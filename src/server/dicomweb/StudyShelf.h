@@ -1,6 +1,7 @@
 #pragma once
 
 #include "server/dicomweb/Arrivals.h"
+#include "server/dicomweb/Presence.h"
 #include "server/http/CacheCount.h"
 
 #include <QByteArray>
@@ -44,15 +45,6 @@ private:
     QByteArray mVersion;
 };
 
-/// What became of a study that was looked up.
-enum class Presence {
-    Found,
-    Absent,   ///< there is no tag file
-    Held,     ///< others hold it longer than the site's patience; asking again makes sense
-    Damaged,  ///< told in the log
-    Missing,  ///< there is no tag file, though there was one and images are registered; told in the log
-};
-
 /// Knows which tag files were written, and by what each was recognised then. Called on several threads at the same time.
 class TagFileWitness
 {
@@ -63,8 +55,8 @@ public:
     /// as they were then: told in the log.
     virtual bool isDamaged(const QByteArray& studyUID, const Kxg::TagFileStamp& read) = 0;
 
-    /// Whether there should be a tag file where none is: told in the log.
-    virtual bool isMissing(const QByteArray& studyUID) = 0;
+    /// Why there is no tag file: `Absent`, `Unbuilt` or `Missing`.
+    virtual Presence whyAbsent(const QByteArray& studyUID) = 0;
 };
 
 /// The tag files that were asked for last, read again as soon as they change. May be used on any thread.

@@ -119,6 +119,22 @@ TEST_F(StudyFaults, EachAnswerIsOneStateWhileOthersChangeTheStudy)
     EXPECT_GT(mSeen.size(), 4);
 }
 
+TEST_F(StudyFaults, AStudyThatWaitsForItsFirstBuildIsNotSaidToBeAbsent)
+{
+    saveImage(1);
+    ASSERT_EQ(kdd("index @").exitCode, 0);
+    serve({QStringLiteral("--corrections")});
+    EXPECT_TRUE(get("studies").body.contains("\"1.2\""));
+    const QByteArrayList targets = {"studies/1.2/metadata", "studies/1.2/instances",
+                                    "studies/1.2/corrections", "studies/1.2/series/1.2.4/instances/1.2.3.1"};
+    for (const int status : {503, 200}) {
+        for (const QByteArray& target : targets)
+            EXPECT_EQ(get(target).status, status) << target.constData();
+        EXPECT_EQ(get("studies/1.3/metadata").status, 404);
+        EXPECT_EQ(kdd("build").exitCode, 0);
+    }
+}
+
 TEST_F(StudyFaults, WhatBecomesOfATagFileShowsAtOnce)
 {
     addStudy();

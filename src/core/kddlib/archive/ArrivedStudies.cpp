@@ -296,9 +296,9 @@ ArrivedStudies::Attempt ArrivedStudies::Private::finish(const QByteArray& studyU
 {
     std::unique_ptr<Kxg::StudyClaim> claim;
     // Nothing has to be done for one that is gone.
-    QVector<QByteArray> known;
-    Result result = catalogue.findStudies(studyUID, 1, known);
-    if (result.bad() || !known.contains(studyUID)) {
+    bool isThere = false;
+    Result result = catalogue.findStudy(studyUID, isThere);
+    if (result.bad() || !isThere) {
         if (result.good())
             take(studyUID);
         return {result};

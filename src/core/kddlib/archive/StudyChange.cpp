@@ -115,19 +115,10 @@ Result tryFor(int patienceMs, bool (*attempt)(QAData&, QString&), QAData& job)
 Removal StudyChange::remove(const ArchiveNode& node, int patienceMs)
 {
     bool isRegistered = false;
-    const Result found = findStudy(node.study, isRegistered);
+    const Result found = mCatalogue.findStudy(node.study, isRegistered);
     if (found.bad())
         return unasked(found);
     return isRegistered ? removeRegistered(node, patienceMs) : removeUnregistered(node);
-}
-
-Result StudyChange::findStudy(const QByteArray& studyUID, bool& isRegistered)
-{
-    QVector<QByteArray> found;
-    // One is enough: before all UIDs that it begins comes the UID itself.
-    Result result = mCatalogue.findStudies(studyUID, 1, found);
-    isRegistered = found.contains(studyUID);
-    return result;
 }
 
 Removal StudyChange::removeRegistered(const ArchiveNode& node, int patienceMs)
@@ -142,7 +133,7 @@ Removal StudyChange::removeRegistered(const ArchiveNode& node, int patienceMs)
                 0};
     bool isRegistered = true;
     // Others may have removed it while this waited for them.
-    if (result.bad() && findStudy(node.study, isRegistered).good() && !isRegistered)
+    if (result.bad() && mCatalogue.findStudy(node.study, isRegistered).good() && !isRegistered)
         return removeUnregistered(node);
     if (result.good())
         result = mCatalogue.studyContents(node.study, contents);

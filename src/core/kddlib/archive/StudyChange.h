@@ -63,7 +63,6 @@ private:
     static constexpr int kRemovalPatience = 10 * 60 * 1000;
     static constexpr int kCorrectionPatience = 2 * 60 * 1000;
 
-    Result findStudy(const QByteArray& studyUID, bool& isRegistered);
     Removal removeRegistered(const ArchiveNode& node, int patienceMs);
     Result forget(const ArchiveNode& node);
 

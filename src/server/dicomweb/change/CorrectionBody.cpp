@@ -112,8 +112,9 @@ Http::Response CorrectionBody::correct()
         return studyIsBusy();
     // Without it nothing is known of images that are registered: that there are none would be taken for an answer.
     std::shared_ptr<const ServedStudy> study;
-    if (!hasImages && mStudies.find(from, study) == Presence::Missing)
-        return Http::failure(500, QStringLiteral("The study's tag file is missing"));
+    const Presence presence = hasImages ? Presence::Found : mStudies.find(from, study);
+    if (presence == Presence::Missing || presence == Presence::Unbuilt)
+        return verdictOn(presence).response();
     const int done = isKept ? 202 : 200;
     Http::Response response = Http::textResponse(hasImages ? done : 404, "application/json",
                                                  correctionReport(mJob, mOrder.root, mOrder.isPreview));

@@ -58,20 +58,6 @@ Http::Response readOrder(const Http::Request& request, CorrectionOrder& order)
     return Http::Response(0);
 }
 
-Http::Response notThere(Presence presence)
-{
-    switch (presence) {
-    case Presence::Held:
-        return studyIsBusy();
-    case Presence::Damaged:
-        return Http::failure(500, QStringLiteral("The study's tag file is damaged"));
-    case Presence::Missing:
-        return Http::failure(500, QStringLiteral("The study's tag file is missing"));
-    default:
-        return Http::failure(404, QStringLiteral("There is no such study"));
-    }
-}
-
 }  // namespace
 
 bool CorrectionsResource::owns(const ResourcePath& path) const
@@ -90,7 +76,7 @@ Http::Response CorrectionsResource::answer(const Http::Request& request, const R
     std::shared_ptr<const ServedStudy> study;
     const Presence presence = mStudies.find(path.study, study);
     if (presence != Presence::Found)
-        return notThere(presence);
+        return verdictOn(presence).response();
     const bool isCsv = form == 1;
     const QByteArray tag = '"' + study->version() + (isCsv ? "-csv\"" : "-json\"");
     if (Http::hasEntity(request, tag))

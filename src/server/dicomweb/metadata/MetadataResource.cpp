@@ -33,23 +33,6 @@ Http::Response found(const QByteArray& tag, const MetadataRequest& metadata)
     return response;
 }
 
-Http::Response notThere(Presence presence)
-{
-    switch (presence) {
-    case Presence::Held: {
-        Http::Response response = Http::failure(503, QStringLiteral("The study is being changed; ask again"));
-        response.addHeader("Retry-After", "2");
-        return response;
-    }
-    case Presence::Damaged:
-        return Http::failure(500, QStringLiteral("The study's tag file is damaged"));
-    case Presence::Missing:
-        return Http::failure(500, QStringLiteral("The study's tag file is missing"));
-    default:
-        return Http::failure(404, QStringLiteral("No such study"));
-    }
-}
-
 }  // namespace
 
 bool MetadataResource::owns(const ResourcePath& path) const
@@ -69,23 +52,26 @@ Http::Response MetadataResource::answer(const Http::Request& request, const Reso
     if (arrivals != nullptr)
         arrivals->bringInOwn(path.study);
     Http::Response response;
+    Presence presence = Presence::Absent;
     const auto isThere = [&] {
-        response = look(request, metadata);
+        response = look(request, metadata, presence);
         // A tag file that is no good may be made anew with what has arrived.
-        return response.status != 404 && response.status != 500;
+        return presence == Presence::Held || (presence == Presence::Found && response.status != 404);
     };
-    return isLackingAfter(isThere, path.study, arrivals) ? notThere(Presence::Held) : std::move(response);
+    return isLackingAfter(isThere, path.study, arrivals) ? verdictOn(Presence::Held).response()
+                                                         : std::move(response);
 }
 
-Http::Response MetadataResource::look(const Http::Request& request, const MetadataRequest& metadata)
+Http::Response MetadataResource::look(const Http::Request& request, const MetadataRequest& metadata,
+                                      Presence& presence)
 {
     // The version alone answers whoever has the answer already or gets one that is kept: both exist only of what was
     // there in this version.
     QByteArray version;
     std::shared_ptr<const ServedStudy> study;
-    Presence presence = mStudies.version(metadata.path.study, version, study);
+    presence = mStudies.version(metadata.path.study, version, study);
     if (presence != Presence::Found)
-        return notThere(presence);
+        return verdictOn(presence).response();
     const QByteArray tag = entityTag(metadata, version);
     if (Http::hasEntity(request, tag, Http::AnyTag::DoesNotCount))
         return Http::notModified(tag, kVary);
@@ -98,7 +84,8 @@ Http::Response MetadataResource::look(const Http::Request& request, const Metada
     }
     if (study == nullptr)
         presence = mStudies.find(metadata.path.study, study);
-    return presence == Presence::Found ? answerFrom(std::move(study), request, metadata) : notThere(presence);
+    return presence == Presence::Found ? answerFrom(std::move(study), request, metadata)
+                                       : verdictOn(presence).response();
 }
 
 Http::Response MetadataResource::answerFrom(std::shared_ptr<const ServedStudy> study,

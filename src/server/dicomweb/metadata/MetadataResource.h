@@ -28,7 +28,7 @@ public:
     const Http::CacheCount& keptCount() const { return mKept.count(); }
 
 private:
-    Http::Response look(const Http::Request& request, const MetadataRequest& metadata);
+    Http::Response look(const Http::Request& request, const MetadataRequest& metadata, Presence& presence);
     Http::Response answerFrom(std::shared_ptr<const ServedStudy> study, const Http::Request& request,
                               const MetadataRequest& metadata);
 

@@ -1,6 +1,6 @@
 #pragma once
 
-#include "server/dicomweb/retrieve/Verdict.h"
+#include "server/dicomweb/Verdict.h"
 
 #include <QSize>
 

@@ -1,7 +1,7 @@
 #pragma once
 
+#include "server/dicomweb/Verdict.h"
 #include "server/dicomweb/retrieve/BodyBlocks.h"
-#include "server/dicomweb/retrieve/Verdict.h"
 #include "server/http/Packing.h"
 
 #include <deque>

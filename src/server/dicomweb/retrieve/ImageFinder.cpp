@@ -29,19 +29,7 @@ Verdict findStudy(StudyShelf& shelf, const ResourcePath& path, std::shared_ptr<c
     };
     if (isLackingAfter(isThere, path.study, shelf.arrivals()))
         presence = Presence::Held;
-    switch (presence) {
-    case Presence::Found:
-        return {};
-    case Presence::Absent:
-        return {404, QStringLiteral("There is no such study")};
-    case Presence::Held:
-        return {503, QStringLiteral("The study is being changed; try again")};
-    case Presence::Missing:
-        return {500, QStringLiteral("The study's tag file is missing")};
-    case Presence::Damaged:
-        break;
-    }
-    return {500, QStringLiteral("The study's tag file cannot be read")};
+    return verdictOn(presence);
 }
 
 const TagMap* findImage(const TagFile& file, const ResourcePath& path)

@@ -2,7 +2,7 @@
 
 #include "server/dicomweb/ResourcePath.h"
 #include "server/dicomweb/StudyShelf.h"
-#include "server/dicomweb/retrieve/Verdict.h"
+#include "server/dicomweb/Verdict.h"
 
 #include <QVector>
 

@@ -1,7 +1,7 @@
 #pragma once
 
+#include "server/dicomweb/Verdict.h"
 #include "server/dicomweb/retrieve/StoredObject.h"
-#include "server/dicomweb/retrieve/Verdict.h"
 #include "server/http/CacheCount.h"
 
 #include <QCache>

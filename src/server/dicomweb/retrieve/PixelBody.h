@@ -1,8 +1,8 @@
 #pragma once
 
 #include "server/dicomweb/MediaTypes.h"
+#include "server/dicomweb/Verdict.h"
 #include "server/dicomweb/retrieve/ObjectShelf.h"
-#include "server/dicomweb/retrieve/Verdict.h"
 #include "server/http/Packing.h"
 
 #include <QVector>

@@ -102,6 +102,12 @@ Http::Response SearchResource::answer(const Http::Request& request, const Resour
             response = Http::failure(500, QStringLiteral("The study's tag file is missing or damaged"));
             return done;
         }
+        std::shared_ptr<const ServedStudy> study;
+        if (isBelowStudies && !search.study.isEmpty() && answers.count() == 0 &&
+            mShelf.find(search.study, study) == Presence::Unbuilt) {
+            response = verdictOn(Presence::Unbuilt).response();
+            return done;
+        }
         response = answerOf(answers, kOffers.at(offer));
         response.addHeader("Vary", "Accept");
         addWarnings(search, run, root, response);

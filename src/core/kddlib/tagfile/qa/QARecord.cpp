@@ -77,11 +77,10 @@ Result QARecord::open(const QAData& job, QList<QByteArray>& uids, QVector<QByteA
     });
     // All are looked up before one is claimed: where the database knows none there is nothing to keep.
     for (const QByteArray& uid : qAsConst(uids)) {
-        QVector<QByteArray> found;
+        bool isThere = false;
         if (result.good())
-            // One is enough: before all UIDs that it begins comes the UID itself.
-            result = catalogue->findStudies(uid, 1, found);
-        if (found.contains(uid))
+            result = catalogue->findStudy(uid, isThere);
+        if (isThere)
             known.append(uid);
     }
     if (result.bad())
@@ -143,11 +142,11 @@ Result QARecord::claimOne(const QByteArray& studyUID, bool isDestination)
 {
     using Making = Kxg::Catalogue::IfAbsent;
     std::unique_ptr<Kxg::StudyClaim> claim;
-    QVector<QByteArray> found;
+    bool isThere = false;
     const Result result =
         mCatalogue->claim(studyUID, kPatience, claim, isDestination ? Making::Create : Making::Fail);
     const QString study = QString::fromLatin1(studyUID);
-    if (result.bad() && mCatalogue->findStudies(studyUID, 1, found).good() && !found.contains(studyUID))
+    if (result.bad() && mCatalogue->findStudy(studyUID, isThere).good() && !isThere)
         return {};
     if (result.bad())
         return asked(result).within(QStringLiteral("Study %1 cannot be claimed").arg(study));

@@ -13,7 +13,14 @@ struct Verdict
 
     bool good() const { return status == 0; }
     bool bad() const { return status != 0; }
-    Http::Response response() const { return Http::failure(status, reason); }
+
+    Http::Response response() const
+    {
+        Http::Response made = Http::failure(status, reason);
+        if (status == 503)
+            made.addHeader("Retry-After", "2");
+        return made;
+    }
 };
 
 }  // namespace Kdd::DicomWeb
