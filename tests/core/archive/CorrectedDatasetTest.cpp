@@ -3,19 +3,15 @@
 #include "core/archive/WholeDataset.h"
 #include "kddlib/Limits.h"
 #include "kddlib/archive/DatasetVerifier.h"
-#include "kddlib/items/RegularFile.h"
-#include "kddlib/net/dicom/DicomFileReader.h"
 #include "kddlib/tagfile/qa/QAAudit.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/tagmodel/TagSequence.h"
-#include "support/ByteSource.h"
 #include "support/DatasetBuilder.h"
-#include "support/RealFiles.h"
+#include "support/RealImage.h"
 
 #include <QTemporaryDir>
 
-#include <dcmtk/dcmdata/dctk.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
@@ -62,88 +58,63 @@ bool isDamaged(const QString& path)
            path.endsWith(QLatin1String("JPEG2000-embedded-sequence-delimiter.dcm"));
 }
 
-struct RealImage
-{
-    explicit RealImage(const QString& path)
-        : source(ByteSource::ofFile(path))
-    {
-        QByteArray converted;
-        if (index.read(source).bad() && readAsRegularFile(path.toLocal8Bit(), converted).good())
-            source = ByteSource(converted);
-        isUsable = index.read(source).good() && readDicomBuffer(source.bytes(), file).good();
-        if (isUsable)
-            image.reset(TagMap::createTagMap(file.getDataset(), kDefaultValueBound));
-    }
-
-    ByteSource source;
-    FrameIndex index;
-    DcmFileFormat file;
-    Map image;
-    bool isUsable = false;
-};
-
-class RealDatasets : public testing::Test
+class RealDatasets : public RealImages
 {
 protected:
-    void SetUp() override
+    /// Calls `test(path, image, map)`.
+    template <typename Test>
+    static void forEach(const Test& test)
     {
-        if (realFilesFolder().isEmpty())
-            GTEST_SKIP() << "KDD_TEST_DATA is not set";
-        for (const char* folder : {"transfer-syntaxes", "multiframe", "modalities", "charsets", "odd"})
-            mPaths += realFiles(folder);
+        RealImages::forEach({"transfer-syntaxes", "multiframe", "modalities", "charsets", "odd"},
+                            [&](const QString& path, RealImage& real) {
+                                const Map map(
+                                    TagMap::createTagMap(real.file.getDataset(), kDefaultValueBound));
+                                test(path, real, *map);
+                            });
     }
-
-    QStringList mPaths;
 };
 
 TEST_F(RealDatasets, AreGivenAsTheirFilesAreUntilTheyAreCorrected)
 {
     int asInFile = 0;
-    for (const QString& path : mPaths) {
-        RealImage real(path);
+    forEach([&](const QString& /*path*/, RealImage& real, const TagMap& map) {
         CorrectedDataset dataset;
-        if (!real.isUsable)
-            continue;
         const QByteArray syntax = real.index.transferSyntaxUID();
-        ASSERT_TRUE(dataset.make(real.source, real.index, *real.image, syntax).good()) << qPrintable(path);
-        EXPECT_TRUE(dataset.isAsInFile()) << qPrintable(path);
-        EXPECT_EQ(faultsOf(wholeOf(dataset, real.source, real.index, syntax), *real.image), "")
-            << qPrintable(path);
+        ASSERT_TRUE(dataset.make(real.source, real.index, map, syntax).good());
+        EXPECT_TRUE(dataset.isAsInFile());
+        EXPECT_EQ(faultsOf(wholeOf(dataset, real.source, real.index, syntax), map), "");
         asInFile += dataset.isAsInFile() ? 1 : 0;
-    }
+    });
     EXPECT_GT(asInFile, 200);
 }
 
 TEST_F(RealDatasets, ShowWhatTheTagFileShowsInEverySyntax)
 {
     int decoded = 0;
-    for (const QString& path : mPaths) {
-        RealImage real(path);
-        if (!real.isUsable)
-            continue;
-        real.image->putAndInsertString(DCM_PatientName, "Corrected^Name");
-        real.image->deleteElement(DCM_StudyDate);
-        real.image->putAndInsertString(DCM_SOPInstanceUID, "1.2.3.4.5.6.7");
+    forEach([&](const QString& path, RealImage& real, TagMap& map) {
+        map.putAndInsertString(DCM_PatientName, "Corrected^Name");
+        map.deleteElement(DCM_StudyDate);
+        map.putAndInsertString(DCM_SOPInstanceUID, "1.2.3.4.5.6.7");
+        const QByteArray stored = real.index.transferSyntaxUID();
         for (const QByteArray& syntax :
-             QVector<QByteArray>{real.index.transferSyntaxUID(), "1.2.840.10008.1.2.1", "1.2.840.10008.1.2"} +
+             QVector<QByteArray>{stored, "1.2.840.10008.1.2.1", "1.2.840.10008.1.2"} +
                  real.index.encodings().mid(0, 1)) {
-            const bool isDecoded = syntax != real.index.transferSyntaxUID() &&
-                                   (real.index.isEncapsulated() || real.index.encodings().contains(syntax));
+            const bool isDecoded =
+                syntax != stored && (real.index.isEncapsulated() || real.index.encodings().contains(syntax));
             // Without VRs what the dictionary does not know loses its own.
-            const bool isLoss = syntax == "1.2.840.10008.1.2" && real.index.transferSyntaxUID() != syntax;
-            CorrectedDataset dataset;
+            const bool isLoss = syntax == "1.2.840.10008.1.2" && stored != syntax;
             if (isLoss || (isDecoded && (!real.index.canDecode() || isDamaged(path))))
                 continue;
-            const Result made = dataset.make(real.source, real.index, *real.image, syntax);
-            ASSERT_TRUE(made.good()) << qPrintable(path) << qPrintable(made.text());
+            CorrectedDataset dataset;
+            const Result made = dataset.make(real.source, real.index, map, syntax);
+            ASSERT_TRUE(made.good()) << qPrintable(made.text());
             EXPECT_FALSE(dataset.isAsInFile());
             const QByteArray whole = wholeOf(dataset, real.source, real.index, syntax);
-            EXPECT_EQ(faultsOf(whole, *real.image, isDecoded), "") << qPrintable(path) << syntax.constData();
-            EXPECT_EQ(uidInMeta(whole), real.image->uid(TagMap::ImageLevel).toStdString())
-                << qPrintable(path);
+            EXPECT_EQ(faultsOf(whole, map, isDecoded), "") << syntax.constData();
+            EXPECT_EQ(uidInMeta(whole), map.uid(TagMap::ImageLevel).toStdString());
             decoded += isDecoded ? 1 : 0;
         }
-    }
+    });
     EXPECT_GT(decoded, 50);
 }
 

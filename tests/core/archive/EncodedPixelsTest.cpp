@@ -1,15 +1,12 @@
 #include "core/archive/WholeDataset.h"
 #include "kddlib/Limits.h"
-#include "kddlib/items/RegularFile.h"
-#include "kddlib/net/dicom/DicomFileReader.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "support/DatasetBuilder.h"
-#include "support/RealFiles.h"
+#include "support/RealImage.h"
 
 #include <QTemporaryDir>
 
 #include <dcmtk/dcmdata/dcrledrg.h>
-#include <dcmtk/dcmdata/dctk.h>
 #include <dcmtk/dcmjpeg/djdecode.h>
 #include <dcmtk/dcmjpls/djdecode.h>
 #include <gtest/gtest.h>
@@ -229,45 +226,37 @@ INSTANTIATE_TEST_SUITE_P(All, EncodedKinds, testing::ValuesIn(kKinds),
 INSTANTIATE_TEST_SUITE_P(All, RecodedKinds, testing::ValuesIn(kindsThatStay()),
                          [](const auto& each) { return each.param.name; });
 
-TEST(EncodedPixels, OfRealFilesAreThoseThatDecodingGives)
+using EncodedRealImages = RealImages;
+
+TEST_F(EncodedRealImages, HaveThePixelsThatDecodingGives)
 {
-    if (realFilesFolder().isEmpty())
-        GTEST_SKIP() << "KDD_TEST_DATA is not set";
     std::map<QByteArray, int> made;
-    for (const QString& path :
-         realFiles("transfer-syntaxes") + realFiles("multiframe") + realFiles("modalities")) {
-        ByteSource source = ByteSource::ofFile(path);
-        QByteArray converted;
-        FrameIndex index;
-        if (index.read(source).bad() && readAsRegularFile(path.toLocal8Bit(), converted).good())
-            source = ByteSource(converted);
+    forEach({"transfer-syntaxes", "multiframe", "modalities"}, [&](const QString& path, RealImage& real) {
         // Beside long ones, one whose frame is smaller than its image, and one that is no whole codestream.
-        if (index.read(source).bad() || index.frames() > 20 || source.size() > 400000 ||
+        if (real.index.frames() > 20 || real.source.size() > 400000 ||
             path.endsWith(QLatin1String("multiframe/sc/multiframe.dcm")) ||
             path.endsWith(QLatin1String("JPEG2000-embedded-sequence-delimiter.dcm")))
-            continue;
-        for (const QByteArray& syntax : index.encodings()) {
-            ByteSource again(fileIn(syntax, source, index));
+            return;
+        for (const QByteArray& syntax : real.index.encodings()) {
+            ByteSource again(fileIn(syntax, real.source, real.index));
             FrameIndex encoded;
-            ASSERT_TRUE(encoded.read(again).good()) << qPrintable(path);
-            ASSERT_EQ(encoded.frames(), index.frames()) << qPrintable(path);
+            ASSERT_TRUE(encoded.read(again).good());
+            ASSERT_EQ(encoded.frames(), real.index.frames());
             OFString photometric;
-            QByteArray whole = pixelsByDcmtk(again.bytes(), photometric);
-            QByteArray expected = pixelsByDcmtk(fileIn("1.2.840.10008.1.2.1", source, index), photometric);
-            DcmFileFormat native;
+            const QByteArray whole = pixelsByDcmtk(again.bytes(), photometric);
+            const QByteArray expected =
+                pixelsByDcmtk(fileIn("1.2.840.10008.1.2.1", real.source, real.index), photometric);
             Uint16 planar = 0;
-            readDicomBuffer(source.bytes(), native);
-            native.getDataset()->findAndGetUint16(DCM_PlanarConfiguration, planar);
+            real.file.getDataset()->findAndGetUint16(DCM_PlanarConfiguration, planar);
             // What is laid out in another way is compared above.
             if (whole.isNull() || planar == 1 || photometric.find("_422") != OFString_npos)
                 continue;
-            EXPECT_TRUE(whole == expected) << qPrintable(path) << ' ' << syntax.constData();
+            EXPECT_TRUE(whole == expected) << syntax.constData();
             ++made[syntax];
         }
-    }
-    EXPECT_GT(made[kRle], 50);
-    EXPECT_GT(made[kJpeg], 50);
-    EXPECT_GT(made[kJpegLs], 50);
+    });
+    for (const char* syntax : {kRle, kJpeg, kJpegLs})
+        EXPECT_GT(made[syntax], 50) << syntax;
 }
 
 }  // namespace
