@@ -119,41 +119,6 @@ TEST(DicomJson, DecodesItemsByTheirOwnCharacterSet)
     EXPECT_THAT(jsonOf(ascii), testing::Not(testing::HasSubstr("ISO_IR 100")));
 }
 
-TEST(DicomJson, OfOwnEntriesLeavesOutWhatIsInheritedHereAndInItems)
-{
-    const auto image = [](const char* uid, const char* comment) {
-        DatasetBuilder builder = anImage(uid).with(DCM_SpecificCharacterSet, "ISO_IR 100");
-        const DatasetBuilder item = anItem().with(DCM_PatientID, "7").with(DCM_SeriesDescription, comment);
-        return builder.with(DCM_StudyDescription, comment).withItem(DCM_ReferencedImageSequence, item);
-    };
-    TagMap series;
-    series.addChildMap(image("1", "\xfc").with(DCM_PatientID, "7").map(), TagMap::ImageLevel);
-    TagMap* second = image("2", "\xe4").withLong(DCM_PatientComments, 2000).map();
-    series.addChildMap(second, TagMap::ImageLevel);
-    std::ostringstream own;
-    writeOwnDicomJson(own, *second, "root");
-    EXPECT_EQ(own.str(), R"({"00080018":{"vr":"UI","Value":["2"]},"00081030":{"vr":"LO","Value":["ä"]},)"
-                         R"("00081140":{"vr":"SQ","Value":[{"0008103E":{"vr":"LO","Value":["ä"]}}]},)"
-                         R"("00104000":{"vr":"LT","BulkDataURI":"root/00104000"}})");
-}
-
-TEST(DicomJson, TellsWhereOmittedValuesAre)
-{
-    const DatasetBuilder item = anItem().withLong(DCM_PatientComments, 2000).with(DCM_PatientID, "7");
-    DatasetBuilder image = anItem().with(DCM_PatientID, "7").withLong(DCM_PatientComments, 2000);
-    image.withItem(DCM_ReferencedImageSequence, anItem()).withItem(DCM_ReferencedImageSequence, item);
-    image.withItem(DcmTag(0x0009, 0x1002, EVR_SQ), item);
-    const std::unique_ptr<TagMap> map(image.map());
-    map->markAsOmitted(DCM_PixelData);
-    EXPECT_EQ(jsonOf(*map),
-              R"({"00080005":{"vr":"CS","Value":["ISO_IR 192"]},)"
-              R"("00081140":{"vr":"SQ","Value":[{},{"00100020":{"vr":"LO","Value":["7"]},)"
-              R"("00104000":{"vr":"LT","BulkDataURI":"root/00081140/1/00104000"}}]},)"
-              R"("00091002":{"vr":"UN","BulkDataURI":"root/00091002"},"00100020":{"vr":"LO","Value":["7"]},)"
-              R"("00104000":{"vr":"LT","BulkDataURI":"root/00104000"},)"
-              R"("7FE00010":{"vr":"OB","BulkDataURI":"root/7FE00010"}})");
-}
-
 TEST(DicomJson, IsValidWhateverBytesTextsHold)
 {
     std::mt19937 random(1);
