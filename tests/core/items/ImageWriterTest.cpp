@@ -26,9 +26,7 @@ namespace
 
 std::string expected(const TagMap& map, bool own = false)
 {
-    std::ostringstream out;
-    (own ? writeOwnDatasetJson : writeDatasetJson)(out, map, "a\"b");
-    return out.str();
+    return datasetJson(map, "a\"b", own ? JsonEntries::Own : JsonEntries::Merged);
 }
 
 std::string written(const TagMap& map, bool own = false)
