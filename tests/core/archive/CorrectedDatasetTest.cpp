@@ -8,9 +8,8 @@
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/tagmodel/TagSequence.h"
 #include "support/DatasetBuilder.h"
+#include "support/FileContent.h"
 #include "support/RealImage.h"
-
-#include <QTemporaryDir>
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -118,7 +117,7 @@ TEST_F(RealDatasets, ShowWhatTheTagFileShowsInEverySyntax)
     EXPECT_GT(decoded, 50);
 }
 
-class CorrectedDatasetTest : public testing::Test
+class CorrectedDatasetTest : public FileTest
 {
 protected:
     CorrectedDatasetTest()
@@ -132,15 +131,14 @@ protected:
 
     void write()
     {
-        const QString path = mFolder.filePath(QStringLiteral("file.dcm"));
-        mImage.save(path);
-        mSource = ByteSource::ofFile(path);
+        mImage.save(path());
+        mSource = ByteSource::ofFile(path());
         ASSERT_TRUE(mIndex.read(mSource).good());
     }
 
     Result make(const TagMap& image) { return mDataset.make(mSource, mIndex, image, "1.2.840.10008.1.2.1"); }
+    QByteArray whole() { return wholeOf(mDataset, mSource, mIndex, ""); }
 
-    QTemporaryDir mFolder;
     DatasetBuilder mImage = anImage();
     ByteSource mSource = ByteSource({});
     FrameIndex mIndex;
@@ -152,10 +150,9 @@ TEST_F(CorrectedDatasetTest, KeepsWhatWasLeftOutBesideACorrectionInAnItem)
     const Map map(mImage.map());
     map->findElement(QStringLiteral("ContentSequence[0]"), DCM_CodeMeaning)->putValue(QByteArray("right"));
     ASSERT_TRUE(make(*map).good());
-    const QByteArray whole = wholeOf(mDataset, mSource, mIndex, "");
-    EXPECT_EQ(faultsOf(whole, *map), "");
-    EXPECT_TRUE(whole.contains("right") && !whole.contains("wrong"));
-    EXPECT_TRUE(whole.contains(QByteArray(5000, 'x')));
+    EXPECT_EQ(faultsOf(whole(), *map), "");
+    EXPECT_TRUE(whole().contains("right") && !whole().contains("wrong"));
+    EXPECT_TRUE(whole().contains(QByteArray(5000, 'x')));
 }
 
 TEST_F(CorrectedDatasetTest, RefusesAFileThatLacksWhatWasLeftOut)
@@ -181,9 +178,8 @@ TEST_F(CorrectedDatasetTest, LeavesOwnAttributesOutAndTheAuditLogIn)
     map->putAndInsertValue(kFilePath, VrCode::LO, "/secret/place");
     log.store(*map);
     ASSERT_TRUE(make(*map).good());
-    const QByteArray whole = wholeOf(mDataset, mSource, mIndex, "");
-    EXPECT_FALSE(whole.contains("secret"));
-    EXPECT_TRUE(whole.contains(log.text().toBase64()));
+    EXPECT_FALSE(whole().contains("secret"));
+    EXPECT_TRUE(whole().contains(log.text().toBase64()));
 }
 
 TEST(ImageOrigin, IsWhatTheFileSaysBeforeAllCorrections)

@@ -2,9 +2,8 @@
 #include "kddlib/Limits.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "support/DatasetBuilder.h"
+#include "support/FileContent.h"
 #include "support/RealImage.h"
-
-#include <QTemporaryDir>
 
 #include <dcmtk/dcmdata/dcrledrg.h>
 #include <dcmtk/dcmjpeg/djdecode.h>
@@ -96,7 +95,7 @@ const Kind kKinds[] = {
     {"YbrPartial", "YBR_PARTIAL_422", 5, 8, 8, 8, false, false, {}},
 };
 
-class EncodedKinds : public testing::TestWithParam<Kind>
+class EncodedKinds : public FileTest, public testing::WithParamInterface<Kind>
 {
 protected:
     static constexpr int kFrames = 3;
@@ -132,9 +131,8 @@ protected:
             image.with(DCM_PlanarConfiguration, kind.isPlanar ? "1" : "0");
         image.with(DCM_SOPClassUID, UID_SecondaryCaptureImageStorage).with(DCM_SOPInstanceUID, "1.2.3");
         image.data(DcmTag(DCM_PixelData, kind.bitsAllocated > 8 ? EVR_OW : EVR_OB), pixels);
-        const QString path = mFolder.filePath(QStringLiteral("file.dcm"));
-        image.save(path);
-        return ByteSource::ofFile(path);
+        image.save(path());
+        return ByteSource::ofFile(path());
     }
 
     /// What a decoder has to give: samples side by side, none of them shared.
@@ -154,8 +152,6 @@ protected:
         }
         return expected.isEmpty() ? pixels : expected;
     }
-
-    QTemporaryDir mFolder;
 };
 
 TEST_P(EncodedKinds, HaveTheSamePixelsInEverySyntax)

@@ -98,7 +98,7 @@ const Encoding kEncodings[] = {
     {"BigEndian", EXS_BigEndianExplicit, EET_ExplicitLength, false, false},
     {"Deflated", EXS_DeflatedLittleEndianExplicit, EET_ExplicitLength, false, false}};
 
-class PlainInputFile : public testing::Test
+class PlainInputFile : public FileTest
 {
 protected:
     QString save(const DatasetBuilder& image, E_TransferSyntax xfer, E_EncodingType lengths)
@@ -106,10 +106,6 @@ protected:
         image.save(path(), xfer, lengths);
         return path();
     }
-
-    QString path() const { return mFolder.filePath(QStringLiteral("file")); }
-
-    QTemporaryDir mFolder;
 };
 
 class PlainInput : public PlainInputFile, public testing::WithParamInterface<Encoding>
@@ -123,7 +119,7 @@ TEST_P(PlainInput, SaysWhatTheParserSays)
               encoding.isPlainWithSequences);
     EXPECT_EQ(isPlain(save(anImage("1").bytes({1, 2}, DCM_PixelData), encoding.xfer, encoding.lengths)),
               encoding.isPlain);
-    const QByteArray whole = fileContent(path());
+    const QByteArray whole = content();
     const int end = 144 + qFromLittleEndian<int>(whole.constData() + 140);
     putFile(path(), whole.left(end));
     EXPECT_FALSE(isPlain(path())) << "nothing follows the meta information";

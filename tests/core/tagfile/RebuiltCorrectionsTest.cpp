@@ -120,10 +120,7 @@ TEST_F(RebuiltCorrections, OfAStudyThatOthersWorkOnAreRefused)
     const std::string before = shown(mAll);
     std::unique_ptr<Kxg::StudyClaim> claim;
     ASSERT_TRUE(mCatalogue->claim("2", 0, claim).good() && claim != nullptr);
-    QAData job = move({"a"}, "1", "2");
-    QString message;
-    EXPECT_FALSE(TagFile::applyQA(job, message));
-    EXPECT_TRUE(job.outcome.isLockedOut) << message.toStdString();
+    refusal(move({"a"}, "1", "2"), true);
     EXPECT_EQ(shown(mAll), before);
 }
 
