@@ -9,14 +9,13 @@
 #include "support/LogCapture.h"
 #include "support/Process.h"
 #include "support/TemporaryStore.h"
+#include "support/Threads.h"
 
 #include <QDir>
 #include <QDirIterator>
 
 #include <gtest/gtest.h>
 #include <libdeflate.h>
-
-#include <thread>
 
 using namespace Kdd;
 
@@ -212,21 +211,18 @@ TEST_F(StoredObjects, OfAnotherServerAreMergedAlongAndThatOneHasNothingLeft)
 
 TEST_F(StoredObjects, ThatTwoSendInOppositeOrderAreTakenOnce)
 {
-    const auto send = [&](bool isReversed) {
+    onThreads(2, [&](int thread) {
         std::vector<std::unique_ptr<ObjectArrival>> arrivals;
         for (int i = 0; i < 40; ++i) {
             // Each twice, too.
-            const int number = (isReversed ? 39 - i : i) / 2;
+            const int number = (thread == 1 ? 39 - i : i) / 2;
             const QByteArray bytes = anImage("1.2.3." + QByteArray::number(number)).file();
             arrivals.push_back(objects->begin());
             arrivals.back()->take(bytes.constData(), bytes.size());
         }
         for (const ArrivedObject& object : objects->commit(arrivals, *openCatalogue()))
             EXPECT_TRUE(object.isStored()) << object.reason.toStdString();
-    };
-    std::thread other([&] { send(true); });
-    send(false);
-    other.join();
+    });
     EXPECT_EQ(filesBelow("objects/1.2").size(), 20);
 }
 

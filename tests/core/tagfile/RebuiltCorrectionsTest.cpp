@@ -6,8 +6,7 @@
 #include "support/LogCapture.h"
 #include "support/PostgresServer.h"
 #include "support/Process.h"
-
-#include <thread>
+#include "support/Threads.h"
 
 namespace Kdd
 {
@@ -223,10 +222,7 @@ TEST_F(RebuiltCorrections, MovesInOppositeDirectionsAtOnceLoseNothing)
     // other one is.
     for (const QByteArray& database : {mAddress, QByteArray()}) {
         Kxg::SetDatabaseServer(database);
-        std::thread there(moveAll, "1", "2");
-        std::thread back(moveAll, "2", "1");
-        there.join();
-        back.join();
+        onThreads(2, [&](int thread) { thread == 0 ? moveAll("1", "2") : moveAll("2", "1"); });
         EXPECT_EQ(imagesIn("1").size() + imagesIn("2").size(), 4);
         if (!database.isEmpty())
             expectSurvival(mAll);
