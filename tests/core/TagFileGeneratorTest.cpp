@@ -32,18 +32,6 @@ protected:
             .with(DCM_InstanceNumber, number);
     }
 
-    /// Writes the file and has it registered, as part of the study that its dataset names or of another.
-    void addFile(const DatasetBuilder& image, const QByteArray& name, const QByteArray& studyUID = "1.2")
-    {
-        image.save(QFile::decodeName(path(name)));
-        Kxg::DicomFileRecord record;
-        record.path = path(name);
-        record.studyInstanceUID = studyUID;
-        record.seriesInstanceUID = "1.2.3";
-        record.sopInstanceUID = name;
-        registerFiles({{record}, {}, {}});
-    }
-
     /// A volume file of the images named, one slice each, whose slices are like `aPicture`.
     void addVolume(const QByteArray& name, const std::vector<std::string>& sopUIDs,
                    QMap<QByteArray, QByteArray> attributes = {})
@@ -74,7 +62,7 @@ protected:
     /// What arrived, with what is known of where it lies.
     void arrive(TagFile& arrivals, const QByteArray& name)
     {
-        addFile(aPicture(name.constData(), name.constData()), name);
+        save(aPicture(name.constData(), name.constData()), name);
         arrivals.addDicomFile(path(name).constData(), path(name).constData(), true)
             ->putAndInsertValue(kFilePath, VrCode::LO, path(name));
     }
@@ -90,7 +78,7 @@ protected:
 TEST_F(GeneratorTest, ImagesVolumesAndPreviewsBecomeOneFile)
 {
     for (const char* uid : {"1", "2", "3", "4"})
-        addFile(aPicture(uid, uid), uid);
+        save(aPicture(uid, uid), uid);
     addVolume("1.2.3-volume.vol", {"1", "2", "3"});
     TagFile built;
     ASSERT_TRUE(build(built));
@@ -117,7 +105,7 @@ TEST_F(GeneratorTest, AHistogramNeedsARangeOrABinForEveryValue)
 {
     const std::tuple<int, int, double> cases[] = {{3, 90, 90}, {256, 0, 255}, {3, 0, 0}, {256, 8, 8}};
     const LogCapture log;
-    addFile(anImage("8"), "8");
+    save(anImage("8"), "8");
     for (const auto& [bins, range, greatest] : cases) {
         mBins = bins;
         mRange = range;
@@ -136,7 +124,7 @@ TEST_F(GeneratorTest, PartsKeepTheirNumbersAndNamesThroughASync)
 {
     for (int part = 1; part <= 12; ++part) {
         const QByteArray number = QByteArray::number(part);
-        addFile(anImage(number), number);
+        save(anImage(number), number);
         if (part != 5)
             addVolume("1.2.3-volume" + (part > 1 ? "_part" + number : QByteArray()) + ".vol",
                       {number.toStdString()});
@@ -158,8 +146,8 @@ TEST_F(GeneratorTest, PartsKeepTheirNumbersAndNamesThroughASync)
 
 TEST_F(GeneratorTest, ASyncRemovesImagesWhoseSeriesHasOnlyAVolumeFileLeft)
 {
-    addFile(anImage("8"), "8");
-    addFile(anImage("9"), "9");
+    save(anImage("8"), "8");
+    save(anImage("9"), "9");
     addVolume("1.2.3-volume.vol", {"8", "9"});
     TagFile file;
     ASSERT_TRUE(build(file));
@@ -171,9 +159,14 @@ TEST_F(GeneratorTest, ASyncRemovesImagesWhoseSeriesHasOnlyAVolumeFileLeft)
 
 TEST_F(GeneratorTest, WhatCannotBeUsedIsNamedAndLeftOut)
 {
-    addFile(anImage("foreign").inStudy("1.9"), "a-foreign");
+    anImage("foreign").inStudy("1.9").save(QFile::decodeName(path("a-foreign")));
+    Kxg::DicomFileRecord foreign;
+    foreign.path = path("a-foreign");
+    foreign.studyInstanceUID = "1.2";
+    foreign.seriesInstanceUID = "1.2.3";
+    registerFiles({{foreign}, {}, {}});
     for (const char* name : {"b", "c", "d"})
-        addFile(anImage(name), name);
+        save(anImage(name), name);
     QFile::remove(QString::fromLocal8Bit(path("c")));
     addVolume("damaged.vol", {"b"});
     ASSERT_TRUE(QFile(QString::fromLocal8Bit(path("damaged.vol"))).resize(500));
@@ -190,8 +183,8 @@ TEST_F(GeneratorTest, WhatCannotBeUsedIsNamedAndLeftOut)
 
 TEST_F(GeneratorTest, AVolumeOfFramesNamesEachImageOnce)
 {
-    addFile(anImage("8"), "8");
-    addFile(anImage("9"), "9");
+    save(anImage("8"), "8");
+    save(anImage("9"), "9");
     addVolume("frames.vol", {"8.0", "8.1", "9.0"}, {{"G0028-0008", "IS:2"}, {"G0008-0060", "CS:MG"}});
     TagFile file;
     ASSERT_TRUE(build(file));
@@ -207,7 +200,7 @@ TEST_F(GeneratorTest, AVolumeOfFramesNamesEachImageOnce)
 
 TEST_F(GeneratorTest, VolumesAreFetchedFromTheirUrls)
 {
-    addFile(anImage("8"), "8");
+    save(anImage("8"), "8");
     writeVolume("a.vol", {"8"});
     const NginxServer server;
     server.addFile("a.vol", fileContent(QFile::decodeName(path("a.vol"))));
