@@ -1,29 +1,36 @@
-#include "kddlib/Limits.h"
 #include "kddlib/archive/DicomInput.h"
+
+#include "kddlib/Limits.h"
 #include "kddlib/archive/ReadInput.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "support/DatasetBuilder.h"
 #include "support/FileContent.h"
 #include "support/LogCapture.h"
+#include "support/ObjectServer.h"
 #include "support/RealFiles.h"
 #include "support/TreeText.h"
 
+#include <QUrl>
 #include <QtEndian>
+
+#include <gmock/gmock.h>
 
 using namespace Kdd;
 
 namespace
 {
 
+/// All that was read, but not where.
 std::string textOf(const DicomInput& input)
 {
-    std::string text = std::to_string(int(input.kind)) + ' ' + input.reason.toStdString() + '\n' +
-                       input.path.toStdString() + '\n' + input.studyUID.toStdString() + '\n' +
-                       input.seriesUID.toStdString() + '\n' + std::to_string(input.stamp.size) + ' ' +
-                       std::to_string(input.stamp.modified) + ' ' + std::to_string(input.fileBytes) + ' ' +
-                       std::to_string(input.headerBytes) + '\n';
+    const std::string text = std::to_string(int(input.kind)) + ' ' + input.reason.toStdString() + '\n' +
+                             input.studyUID.toStdString() + '\n' + input.seriesUID.toStdString() + '\n' +
+                             std::to_string(input.stamp.size) + ' ' + std::to_string(input.fileBytes) + ' ' +
+                             std::to_string(input.headerBytes) + '\n';
     return input.map != nullptr ? text + ownText(*input.map) : text;
 }
+
+// ---- files that are read without the parser
 
 /// Whether the file is read without the parser; what then is said of it must be what the parser says.
 bool isPlain(const QString& path)
@@ -35,8 +42,12 @@ bool isPlain(const QString& path)
     const LogCapture log;
     DicomInput ahead;
     EXPECT_TRUE(takePlain(name, PlainFiles({name}, 1, kDefaultValueBound).next(), ahead));
-    EXPECT_EQ(textOf(plain), textOf(ahead)) << name.constData();
-    EXPECT_EQ(textOf(plain), textOf(parseInput(name, Damage::Refused))) << name.constData();
+    DicomInput parsed = parseInput(name, Damage::Refused);
+    for (const DicomInput* other : {&ahead, &parsed}) {
+        EXPECT_EQ(textOf(plain), textOf(*other)) << name.constData();
+        EXPECT_EQ(plain.path, other->path);
+        EXPECT_EQ(plain.stamp.modified, other->stamp.modified) << name.constData();
+    }
     EXPECT_TRUE(log.lines().empty()) << "of what is plain nothing is to be told";
     return true;
 }
@@ -195,6 +206,97 @@ TEST(PlainInputOfRealFiles, SaysWhatTheParserSays)
     for (const QString& file : files)
         plain += isPlain(file) ? 1 : 0;
     EXPECT_GT(2 * plain, files.size()) << "of which many are unusual on purpose";
+}
+
+// ---- objects that are read by ranges
+
+/// Of what is read by ranges the same has to come as of a file with the same bytes.
+class ObjectInput : public FileTest
+{
+protected:
+    void expectSame(const std::string& url, const QString& path)
+    {
+        const LogCapture log;
+        const DicomInput remote = readDicomInput(QByteArray::fromStdString(url), Damage::Refused);
+        const DicomInput local = readDicomInput(path.toLocal8Bit(), Damage::Refused);
+        EXPECT_EQ(remote.path.toStdString(), url);
+        EXPECT_EQ(textOf(remote), textOf(local)) << url;
+    }
+
+    /// By a server that knows ranges and one that does not.
+    void expectSame(const QByteArray& content)
+    {
+        putFile(path(), content);
+        expectSame(ObjectServer(content).url(), path());
+        expectSame(ScriptedServer(httpResponse(content)).url("a"), path());
+    }
+};
+
+TEST_F(ObjectInput, IsWhatAFileOfTheSameBytesIs)
+{
+    // Longer than what comes with the first range, in the middle and at the end, and behind the pixels.
+    const DatasetBuilder image =
+        anImage("1.2.3")
+            .with(DCM_PatientName, "Doe^J")
+            .withLong(DCM_TextValue, 100'000)
+            .withItem(DCM_VOILUTSequence, anItem().words(std::vector<Uint16>(40'000, 1), DCM_LUTData))
+            .words(std::vector<Uint16>(100'000, 5))
+            .bytes({1, 2, 3, 4}, DCM_DataSetTrailingPadding);
+    for (const E_TransferSyntax xfer : {EXS_LittleEndianExplicit, EXS_LittleEndianImplicit,
+                                        EXS_BigEndianExplicit, EXS_DeflatedLittleEndianExplicit})
+        expectSame(image.file(xfer));
+    const QByteArray whole = image.file();
+    expectSame(whole.chopped(1));
+    expectSame(whole.left(50'000));
+    expectSame(whole.mid(132));
+    expectSame("no image at all");
+    expectSame(someObject(40'000));
+}
+
+TEST_F(ObjectInput, PassesOverFragmentsToTheLastOne)
+{
+    DatasetBuilder image = anImage("1.2");
+    image.fragments(EXS_JPEGProcess14SV1, {0, 70000, 4, 3000});
+    const QByteArray whole = image.file(EXS_JPEGProcess14SV1);
+    expectSame(whole);
+    for (const int cut : {1, 3000, 4000})
+        expectSame(whole.chopped(cut));
+}
+
+TEST_F(ObjectInput, IsWhatTheFileIsForRealFiles)
+{
+    if (realFilesFolder().isEmpty())
+        GTEST_SKIP() << "KDD_TEST_DATA names no folder of DICOM files";
+    const NginxServer server(NginxServer::Scheme::Http,
+                             "location /data/ { alias \"" + realFilesFolder().toLocal8Bit() + "/\"; }");
+    const QStringList files = realFiles("");
+    for (const QString& file : files) {
+        const QByteArray name = QUrl::toPercentEncoding(file.mid(realFilesFolder().size() + 1), "/");
+        expectSame(server.url("data/" + name.toStdString()), file);
+    }
+    EXPECT_GT(files.size(), 0);
+}
+
+/// One that cannot be had, wholly or in part, is never taken for something else.
+TEST_F(ObjectInput, IsUnusableWhenItIsNotToBeHad)
+{
+    const auto read = [](const std::string& url) {
+        const DicomInput input = readDicomInput(QByteArray::fromStdString(url), Damage::Refused);
+        EXPECT_EQ(input.kind, DicomInput::Kind::Unusable) << url;
+        return input.reason.toStdString();
+    };
+    EXPECT_EQ(read(ScriptedServer(httpResponse("no", "403 Forbidden")).url("a")), "HTTP response code 403");
+    const QByteArray image =
+        anImage("1").withLong(DCM_TextValue, 100'000).with(DCM_CodeValue, "1").file(EXS_BigEndianExplicit);
+    EXPECT_THAT(read(ObjectServer(image,
+                                  [](auto& answer) {
+                                      if (answer.first > 0)
+                                          answer.entityTag = "\"v2\"";
+                                  })
+                         .url()),
+                testing::HasSubstr("changed"));
+    EXPECT_EQ(read(ScriptedServer("HTTP/1.1 416 -\r\nContent-Range: bytes */0\r\n\r\n").url("a")),
+              "The file is empty");
 }
 
 }  // namespace
