@@ -86,6 +86,7 @@ DatasetBuilder anImageOfAllKinds()
 {
     DatasetBuilder image = aShortImageOfAllKinds();
     image.withLong(DCM_ImageComments, 3000).with(privateValue(0x1002, QByteArray(5000, 'x')));
+    image.with(privateValue(0x1003, QByteArray(static_cast<int>(kDefaultValueBound), 'y')));
     Uint16 element = 0x1010;
     for (const int length : {900, 988, 990, 992})
         image.withItem(DcmTag(0x0029, element++, EVR_SQ), anItem().withLong(DCM_TextValue, length));

@@ -3,6 +3,9 @@
 #include "platform/database/DirectoryEntry.h"
 #include "support/RandomImages.h"
 
+#include <algorithm>
+#include <map>
+#include <set>
 #include <sstream>
 
 namespace Kdd
