@@ -164,6 +164,7 @@ TEST_F(GeneratorTest, WhatCannotBeUsedIsNamedAndLeftOut)
     foreign.path = path("a-foreign");
     foreign.studyInstanceUID = "1.2";
     foreign.seriesInstanceUID = "1.2.3";
+    foreign.sopInstanceUID = "foreign";
     registerFiles({{foreign}, {}, {}});
     for (const char* name : {"b", "c", "d"})
         save(anImage(name), name);
