@@ -11,7 +11,6 @@
 
 #include <QImage>
 
-#include <functional>
 #include <tuple>
 
 namespace Kdd
@@ -33,18 +32,6 @@ protected:
             .with(DCM_InstanceNumber, number);
     }
 
-    /// Writes the file and has it registered, as part of the study that its dataset names or of another.
-    void addFile(const DatasetBuilder& image, const QByteArray& name, const QByteArray& studyUID = "1.2")
-    {
-        image.save(QFile::decodeName(path(name)));
-        Kxg::DicomFileRecord record;
-        record.path = path(name);
-        record.studyInstanceUID = studyUID;
-        record.seriesInstanceUID = "1.2.3";
-        record.sopInstanceUID = name;
-        registerFiles({{record}, {}, {}});
-    }
-
     /// A volume file of the images named, one slice each, whose slices are like `aPicture`.
     void addVolume(const QByteArray& name, const std::vector<std::string>& sopUIDs,
                    QMap<QByteArray, QByteArray> attributes = {})
@@ -63,6 +50,23 @@ protected:
         return !studies.empty() && TagFileGenerator().createTagFile(file, studies.front().id, studyUID);
     }
 
+    /// Places the image of a file as it is placed while one looks through them.
+    void load(TagFile& into, const QByteArray& name) const
+    {
+        DcmFileFormat file;
+        EXPECT_TRUE(file.loadFile(path(name).constData()).good());
+        std::unique_ptr<TagMap> image(TagMap::createTagMap(file.getDataset(), kDefaultValueBound));
+        EXPECT_NE(TagFileGenerator::place(into, std::move(image), path(name)), nullptr);
+    }
+
+    /// What arrived, with what is known of where it lies.
+    void arrive(TagFile& arrivals, const QByteArray& name)
+    {
+        save(aPicture(name.constData(), name.constData()), name);
+        arrivals.addDicomFile(path(name).constData(), path(name).constData(), true)
+            ->putAndInsertValue(kFilePath, VrCode::LO, path(name));
+    }
+
     static int valueOf(const TagMap* node, const DcmTagKey& key)
     {
         int value = -1;
@@ -74,7 +78,7 @@ protected:
 TEST_F(GeneratorTest, ImagesVolumesAndPreviewsBecomeOneFile)
 {
     for (const char* uid : {"1", "2", "3", "4"})
-        addFile(aPicture(uid, uid), uid);
+        save(aPicture(uid, uid), uid);
     addVolume("1.2.3-volume.vol", {"1", "2", "3"});
     TagFile built;
     ASSERT_TRUE(build(built));
@@ -94,16 +98,14 @@ TEST_F(GeneratorTest, ImagesVolumesAndPreviewsBecomeOneFile)
     const QImage picture = QImage::fromData(preview->value());
     EXPECT_LT(qGray(picture.pixel(2, 16)), 30);
     EXPECT_GT(qGray(picture.pixel(29, 16)), 220);
-    QByteArray held;
-    EXPECT_TRUE(file.findImage("4")->findAndGetString(kFilePath, held));
-    EXPECT_EQ(held, path("4"));
+    EXPECT_EQ(filePathOf(*file.findImage("4")), path("4"));
 }
 
 TEST_F(GeneratorTest, AHistogramNeedsARangeOrABinForEveryValue)
 {
     const std::tuple<int, int, double> cases[] = {{3, 90, 90}, {256, 0, 255}, {3, 0, 0}, {256, 8, 8}};
     const LogCapture log;
-    addFile(anImage("8"), "8");
+    save(anImage("8"), "8");
     for (const auto& [bins, range, greatest] : cases) {
         mBins = bins;
         mRange = range;
@@ -122,7 +124,7 @@ TEST_F(GeneratorTest, PartsKeepTheirNumbersAndNamesThroughASync)
 {
     for (int part = 1; part <= 12; ++part) {
         const QByteArray number = QByteArray::number(part);
-        addFile(anImage(number), number);
+        save(anImage(number), number);
         if (part != 5)
             addVolume("1.2.3-volume" + (part > 1 ? "_part" + number : QByteArray()) + ".vol",
                       {number.toStdString()});
@@ -144,22 +146,28 @@ TEST_F(GeneratorTest, PartsKeepTheirNumbersAndNamesThroughASync)
 
 TEST_F(GeneratorTest, ASyncRemovesImagesWhoseSeriesHasOnlyAVolumeFileLeft)
 {
-    addFile(anImage("8"), "8");
-    addFile(anImage("9"), "9");
+    save(anImage("8"), "8");
+    save(anImage("9"), "9");
     addVolume("1.2.3-volume.vol", {"8", "9"});
     TagFile file;
     ASSERT_TRUE(build(file));
     ASSERT_TRUE(mCatalogue->removeFiles({path("8"), path("9")}).good());
     ASSERT_TRUE(file.readAndSync("1.2", ""));
     EXPECT_TRUE(file.imagesByUID().isEmpty());
-    EXPECT_EQ(file.seriesByUID().keys(), QList<QByteArray>{"1.2.3"});
+    EXPECT_EQ(file.seriesByUID().keys(), Uids{"1.2.3"});
 }
 
 TEST_F(GeneratorTest, WhatCannotBeUsedIsNamedAndLeftOut)
 {
-    addFile(anImage("foreign").inStudy("1.9"), "a-foreign");
+    anImage("foreign").inStudy("1.9").save(QFile::decodeName(path("a-foreign")));
+    Kxg::DicomFileRecord foreign;
+    foreign.path = path("a-foreign");
+    foreign.studyInstanceUID = "1.2";
+    foreign.seriesInstanceUID = "1.2.3";
+    foreign.sopInstanceUID = "foreign";
+    registerFiles({{foreign}, {}, {}});
     for (const char* name : {"b", "c", "d"})
-        addFile(anImage(name), name);
+        save(anImage(name), name);
     QFile::remove(QString::fromLocal8Bit(path("c")));
     addVolume("damaged.vol", {"b"});
     ASSERT_TRUE(QFile(QString::fromLocal8Bit(path("damaged.vol"))).resize(500));
@@ -167,7 +175,7 @@ TEST_F(GeneratorTest, WhatCannotBeUsedIsNamedAndLeftOut)
     const LogCapture log;
     TagFile file;
     ASSERT_TRUE(build(file));
-    EXPECT_EQ(file.imagesByUID().keys(), (QList<QByteArray>{"b", "d"}));
+    EXPECT_EQ(file.imagesByUID().keys(), (Uids{"b", "d"}));
     EXPECT_EQ(log.count("File " + path("a-foreign").toStdString() + " does not belong to study 1.2"), 1);
     EXPECT_EQ(log.count("Could not open " + path("c").toStdString() + ": "), 1);
     EXPECT_EQ(log.count("damaged.vol"), 1);
@@ -176,8 +184,8 @@ TEST_F(GeneratorTest, WhatCannotBeUsedIsNamedAndLeftOut)
 
 TEST_F(GeneratorTest, AVolumeOfFramesNamesEachImageOnce)
 {
-    addFile(anImage("8"), "8");
-    addFile(anImage("9"), "9");
+    save(anImage("8"), "8");
+    save(anImage("9"), "9");
     addVolume("frames.vol", {"8.0", "8.1", "9.0"}, {{"G0028-0008", "IS:2"}, {"G0008-0060", "CS:MG"}});
     TagFile file;
     ASSERT_TRUE(build(file));
@@ -193,12 +201,10 @@ TEST_F(GeneratorTest, AVolumeOfFramesNamesEachImageOnce)
 
 TEST_F(GeneratorTest, VolumesAreFetchedFromTheirUrls)
 {
-    addFile(anImage("8"), "8");
+    save(anImage("8"), "8");
     writeVolume("a.vol", {"8"});
-    QFile volume(QString::fromLocal8Bit(path("a.vol")));
-    ASSERT_TRUE(volume.open(QIODevice::ReadOnly));
     const NginxServer server;
-    server.addFile("a.vol", volume.readAll());
+    server.addFile("a.vol", fileContent(QFile::decodeName(path("a.vol"))));
     registerVolume(QByteArray::fromStdString(server.url("/a.vol")));
     registerVolume(QByteArray::fromStdString(server.url("/gone.vol")));
     const LogCapture log;
@@ -212,64 +218,43 @@ TEST_F(GeneratorTest, VolumesAreFetchedFromTheirUrls)
 TEST_F(GeneratorTest, WhatIsLoadedAlreadyMakesTheSameFile)
 {
     RandomImages random(7);
-    std::vector<QByteArray> names;
+    Uids names;
     for (int i = 10; i < 40; ++i) {
-        names.push_back(QByteArray::number(i));
-        delete random.next(names.back());
-        save(random.last(), names.back());
+        names.append(QByteArray::number(i));
+        delete random.next(names.last());
+        save(random.last(), names.last());
     }
-    const QByteArray study = studies().first();
-    const auto load = [&](TagFile& into, const QByteArray& name) {
-        DcmFileFormat file;
-        EXPECT_TRUE(file.loadFile(path(name).constData()).good());
-        std::unique_ptr<TagMap> image(TagMap::createTagMap(file.getDataset(), kDefaultValueBound));
-        EXPECT_NE(TagFileGenerator::place(into, std::move(image), path(name)), nullptr);
-    };
-    const auto inOrder = [&](TagFile& into) {
-        for (const QByteArray& name : names)
-            load(into, name);
-    };
     const auto fileBuiltWith = [&](TagFile& loaded) {
         std::vector<Kxg::StudySummary> list;
         EXPECT_TRUE(mCatalogue->listStudies(list).good());
+        const Kxg::StudySummary& study = list.front();
         TagFile built;
-        EXPECT_TRUE(TagFileGenerator().createTagFile(built, list.front().id, study.constData(), loaded));
-        QFile file(TagFile::cacheFilePathForStudy(study));
-        EXPECT_TRUE(file.open(QIODevice::ReadOnly));
-        return file.readAll();
+        EXPECT_TRUE(
+            TagFileGenerator().createTagFile(built, study.id, study.studyInstanceUID.constData(), loaded));
+        return fileContent(TagFile::cacheFilePathForStudy(study.studyInstanceUID));
     };
     TagFile nothing;
     const QByteArray expected = fileBuiltWith(nothing);
-    const char* first[] = {names.front().constData()};
-    const std::tuple<const char*, bool, std::function<void(TagFile&)>> cases[] = {
-        {"all, in their order", true, inOrder},
-        {"backwards", false,
-         [&](TagFile& into) {
-             for (auto name = names.rbegin(); name != names.rend(); ++name)
-                 load(into, *name);
-         }},
-        {"the first replaced", false,
-         [&](TagFile& into) {
-             inOrder(into);
-             load(into, names.front());
-         }},
-        {"the first taken out and put back", false,
-         [&](TagFile& into) {
-             inOrder(into);
-             into.removeImages(1, first);
-             load(into, names.front());
-         }},
-        {"without the first", false,
-         [&](TagFile& into) {
-             inOrder(into);
-             into.removeImages(1, first);
-         }},
+    const Uids backwards(names.crbegin(), names.crend());
+    // A name with "-" in front is taken out.
+    const std::pair<const char*, Uids> cases[] = {
+        {"all, in their order", names},
+        {"backwards", backwards},
+        {"the first replaced", names + Uids{"10"}},
+        {"the first taken out and put back", names + Uids{"-10", "10"}},
+        {"without the first", names + Uids{"-10"}},
     };
-    for (const auto& [what, isTakenOver, fill] : cases) {
+    for (const auto& [what, steps] : cases) {
         TagFile loaded;
-        fill(loaded);
+        for (const QByteArray& step : steps) {
+            const char* gone = step.constData() + 1;
+            if (step.startsWith('-'))
+                EXPECT_EQ(loaded.removeImages(1, &gone), 1);
+            else
+                load(loaded, step);
+        }
         EXPECT_EQ(fileBuiltWith(loaded), expected) << what;
-        EXPECT_EQ(loaded.isEmpty(), isTakenOver) << what;
+        EXPECT_EQ(loaded.isEmpty(), steps == names) << what << ": whether it was taken over";
     }
 }
 
@@ -283,23 +268,15 @@ TEST_F(GeneratorTest, ADatabaseThatCannotAnswerFailsTheBuild)
 
 TEST_F(GeneratorTest, ArrivalsGetThePreviewsThatTheWholeStudyWants)
 {
-    const QByteArray numbers[] = {"10", "11", "12", "13", "14", "15", "16", "17", "18", "19", "20"};
     TagFile arrivals;
-    for (const QByteArray& number : numbers) {
-        addFile(aPicture(number.constData(), number.constData()), number);
-        arrivals.addDicomFile(path(number).constData(), path(number).constData(), true)
-            ->putAndInsertValue(kFilePath, VrCode::LO, path(number));
-    }
+    TagFile more;
+    for (int number = 10; number <= 20; ++number)
+        arrive(arrivals, QByteArray::number(number));
     TagFileGenerator().completeArrivals(arrivals);
     EXPECT_NE(arrivals.findImage("10")->findElement(kPreview), nullptr) << "a short series shows all";
     ASSERT_TRUE(arrivals.mergeIntoCacheFile());
-    TagFile more;
-    for (const QByteArray& number : numbers) {
-        const QByteArray next = number + "00";
-        addFile(aPicture(next.constData(), next.constData()), next);
-        more.addDicomFile(path(next).constData(), path(next).constData(), true)
-            ->putAndInsertValue(kFilePath, VrCode::LO, path(next));
-    }
+    for (int number = 10; number <= 20; ++number)
+        arrive(more, QByteArray::number(100 * number));
     TagFileGenerator().completeArrivals(more);
     int previews = 0;
     for (const TagMap* image : more.imagesByUID())

@@ -13,14 +13,14 @@
 namespace Kdd
 {
 
-/// Whether `life` is true in a process of its own; the signal, negative, when that ended it.
+/// What `life` gives, up to 255, in a process of its own; the signal, negative, when that ended it.
 template <typename Life>
 int inChild(const Life& life)
 {
     int status = 0;
     const pid_t pid = ::fork();
     if (pid == 0)
-        ::_exit(life() ? 1 : 0);
+        ::_exit(static_cast<int>(life()));
     ::waitpid(pid, &status, 0);
     return WIFEXITED(status) ? WEXITSTATUS(status) : -WTERMSIG(status);
 }

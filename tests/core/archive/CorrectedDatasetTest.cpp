@@ -3,19 +3,14 @@
 #include "core/archive/WholeDataset.h"
 #include "kddlib/Limits.h"
 #include "kddlib/archive/DatasetVerifier.h"
-#include "kddlib/items/RegularFile.h"
-#include "kddlib/net/dicom/DicomFileReader.h"
 #include "kddlib/tagfile/qa/QAAudit.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/tagmodel/TagSequence.h"
-#include "support/ByteSource.h"
 #include "support/DatasetBuilder.h"
-#include "support/RealFiles.h"
+#include "support/FileContent.h"
+#include "support/RealImage.h"
 
-#include <QTemporaryDir>
-
-#include <dcmtk/dcmdata/dctk.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
@@ -62,92 +57,49 @@ bool isDamaged(const QString& path)
            path.endsWith(QLatin1String("JPEG2000-embedded-sequence-delimiter.dcm"));
 }
 
-struct RealImage
-{
-    explicit RealImage(const QString& path)
-        : source(ByteSource::ofFile(path))
-    {
-        QByteArray converted;
-        if (index.read(source).bad() && readAsRegularFile(path.toLocal8Bit(), converted).good())
-            source = ByteSource(converted);
-        isUsable = index.read(source).good() && readDicomBuffer(source.bytes(), file).good();
-        if (isUsable)
-            image.reset(TagMap::createTagMap(file.getDataset(), kDefaultValueBound));
-    }
+using RealDatasets = RealImages;
 
-    ByteSource source;
-    FrameIndex index;
-    DcmFileFormat file;
-    Map image;
-    bool isUsable = false;
-};
-
-class RealDatasets : public testing::Test
-{
-protected:
-    void SetUp() override
-    {
-        if (realFilesFolder().isEmpty())
-            GTEST_SKIP() << "KDD_TEST_DATA is not set";
-        for (const char* folder : {"transfer-syntaxes", "multiframe", "modalities", "charsets", "odd"})
-            mPaths += realFiles(folder);
-    }
-
-    QStringList mPaths;
-};
-
-TEST_F(RealDatasets, AreGivenAsTheirFilesAreUntilTheyAreCorrected)
+TEST_F(RealDatasets, AreAsTheirFilesAreUntilCorrectedAndThenAsTheTagFileShowsInEverySyntax)
 {
     int asInFile = 0;
-    for (const QString& path : mPaths) {
-        RealImage real(path);
-        CorrectedDataset dataset;
-        if (!real.isUsable)
-            continue;
-        const QByteArray syntax = real.index.transferSyntaxUID();
-        ASSERT_TRUE(dataset.make(real.source, real.index, *real.image, syntax).good()) << qPrintable(path);
-        EXPECT_TRUE(dataset.isAsInFile()) << qPrintable(path);
-        EXPECT_EQ(faultsOf(wholeOf(dataset, real.source, real.index, syntax), *real.image), "")
-            << qPrintable(path);
-        asInFile += dataset.isAsInFile() ? 1 : 0;
-    }
-    EXPECT_GT(asInFile, 200);
-}
-
-TEST_F(RealDatasets, ShowWhatTheTagFileShowsInEverySyntax)
-{
     int decoded = 0;
-    for (const QString& path : mPaths) {
-        RealImage real(path);
-        if (!real.isUsable)
-            continue;
-        real.image->putAndInsertString(DCM_PatientName, "Corrected^Name");
-        real.image->deleteElement(DCM_StudyDate);
-        real.image->putAndInsertString(DCM_SOPInstanceUID, "1.2.3.4.5.6.7");
+    forEach({"transfer-syntaxes", "multiframe", "modalities", "charsets", "odd"}, [&](const QString& path,
+                                                                                      RealImage& real) {
+        const Map map(TagMap::createTagMap(real.file.getDataset(), kDefaultValueBound));
+        const QByteArray stored = real.index.transferSyntaxUID();
+        CorrectedDataset unchanged;
+        ASSERT_TRUE(unchanged.make(real.source, real.index, *map, stored).good());
+        EXPECT_TRUE(unchanged.isAsInFile());
+        EXPECT_EQ(faultsOf(wholeOf(unchanged, real.source, real.index, stored), *map), "");
+        ++asInFile;
+
+        map->putAndInsertString(DCM_PatientName, "Corrected^Name");
+        map->deleteElement(DCM_StudyDate);
+        map->putAndInsertString(DCM_SOPInstanceUID, "1.2.3.4.5.6.7");
         for (const QByteArray& syntax :
-             QVector<QByteArray>{real.index.transferSyntaxUID(), "1.2.840.10008.1.2.1", "1.2.840.10008.1.2"} +
+             QVector<QByteArray>{stored, "1.2.840.10008.1.2.1", "1.2.840.10008.1.2"} +
                  real.index.encodings().mid(0, 1)) {
-            const bool isDecoded = syntax != real.index.transferSyntaxUID() &&
-                                   (real.index.isEncapsulated() || real.index.encodings().contains(syntax));
+            const bool isDecoded =
+                syntax != stored && (real.index.isEncapsulated() || real.index.encodings().contains(syntax));
             // Without VRs what the dictionary does not know loses its own.
-            const bool isLoss = syntax == "1.2.840.10008.1.2" && real.index.transferSyntaxUID() != syntax;
-            CorrectedDataset dataset;
+            const bool isLoss = syntax == "1.2.840.10008.1.2" && stored != syntax;
             if (isLoss || (isDecoded && (!real.index.canDecode() || isDamaged(path))))
                 continue;
-            const Result made = dataset.make(real.source, real.index, *real.image, syntax);
-            ASSERT_TRUE(made.good()) << qPrintable(path) << qPrintable(made.text());
+            CorrectedDataset dataset;
+            const Result made = dataset.make(real.source, real.index, *map, syntax);
+            ASSERT_TRUE(made.good()) << qPrintable(made.text());
             EXPECT_FALSE(dataset.isAsInFile());
             const QByteArray whole = wholeOf(dataset, real.source, real.index, syntax);
-            EXPECT_EQ(faultsOf(whole, *real.image, isDecoded), "") << qPrintable(path) << syntax.constData();
-            EXPECT_EQ(uidInMeta(whole), real.image->uid(TagMap::ImageLevel).toStdString())
-                << qPrintable(path);
+            EXPECT_EQ(faultsOf(whole, *map, isDecoded), "") << syntax.constData();
+            EXPECT_EQ(uidInMeta(whole), map->uid(TagMap::ImageLevel).toStdString());
             decoded += isDecoded ? 1 : 0;
         }
-    }
+    });
+    EXPECT_GT(asInFile, 200);
     EXPECT_GT(decoded, 50);
 }
 
-class CorrectedDatasetTest : public testing::Test
+class CorrectedDatasetTest : public FileTest
 {
 protected:
     CorrectedDatasetTest()
@@ -161,15 +113,14 @@ protected:
 
     void write()
     {
-        const QString path = mFolder.filePath(QStringLiteral("file.dcm"));
-        mImage.save(path);
-        mSource = ByteSource::ofFile(path);
+        mImage.save(path());
+        mSource = ByteSource::ofFile(path());
         ASSERT_TRUE(mIndex.read(mSource).good());
     }
 
     Result make(const TagMap& image) { return mDataset.make(mSource, mIndex, image, "1.2.840.10008.1.2.1"); }
+    QByteArray whole() { return wholeOf(mDataset, mSource, mIndex, ""); }
 
-    QTemporaryDir mFolder;
     DatasetBuilder mImage = anImage();
     ByteSource mSource = ByteSource({});
     FrameIndex mIndex;
@@ -181,10 +132,9 @@ TEST_F(CorrectedDatasetTest, KeepsWhatWasLeftOutBesideACorrectionInAnItem)
     const Map map(mImage.map());
     map->findElement(QStringLiteral("ContentSequence[0]"), DCM_CodeMeaning)->putValue(QByteArray("right"));
     ASSERT_TRUE(make(*map).good());
-    const QByteArray whole = wholeOf(mDataset, mSource, mIndex, "");
-    EXPECT_EQ(faultsOf(whole, *map), "");
-    EXPECT_TRUE(whole.contains("right") && !whole.contains("wrong"));
-    EXPECT_TRUE(whole.contains(QByteArray(5000, 'x')));
+    EXPECT_EQ(faultsOf(whole(), *map), "");
+    EXPECT_TRUE(whole().contains("right") && !whole().contains("wrong"));
+    EXPECT_TRUE(whole().contains(QByteArray(5000, 'x')));
 }
 
 TEST_F(CorrectedDatasetTest, RefusesAFileThatLacksWhatWasLeftOut)
@@ -210,9 +160,8 @@ TEST_F(CorrectedDatasetTest, LeavesOwnAttributesOutAndTheAuditLogIn)
     map->putAndInsertValue(kFilePath, VrCode::LO, "/secret/place");
     log.store(*map);
     ASSERT_TRUE(make(*map).good());
-    const QByteArray whole = wholeOf(mDataset, mSource, mIndex, "");
-    EXPECT_FALSE(whole.contains("secret"));
-    EXPECT_TRUE(whole.contains(log.text().toBase64()));
+    EXPECT_FALSE(whole().contains("secret"));
+    EXPECT_TRUE(whole().contains(log.text().toBase64()));
 }
 
 TEST(ImageOrigin, IsWhatTheFileSaysBeforeAllCorrections)

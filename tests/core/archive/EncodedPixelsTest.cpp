@@ -1,21 +1,15 @@
 #include "core/archive/WholeDataset.h"
 #include "kddlib/Limits.h"
-#include "kddlib/items/RegularFile.h"
-#include "kddlib/net/dicom/DicomFileReader.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "support/DatasetBuilder.h"
-#include "support/RealFiles.h"
-
-#include <QTemporaryDir>
+#include "support/FileContent.h"
+#include "support/RealImage.h"
 
 #include <dcmtk/dcmdata/dcrledrg.h>
-#include <dcmtk/dcmdata/dctk.h>
 #include <dcmtk/dcmjpeg/djdecode.h>
 #include <dcmtk/dcmjpls/djdecode.h>
 #include <gtest/gtest.h>
 
-#include <algorithm>
-#include <iterator>
 #include <map>
 #include <memory>
 #include <random>
@@ -99,7 +93,7 @@ const Kind kKinds[] = {
     {"YbrPartial", "YBR_PARTIAL_422", 5, 8, 8, 8, false, false, {}},
 };
 
-class EncodedKinds : public testing::TestWithParam<Kind>
+class EncodedKinds : public FileTest, public testing::WithParamInterface<Kind>
 {
 protected:
     static constexpr int kFrames = 3;
@@ -135,9 +129,8 @@ protected:
             image.with(DCM_PlanarConfiguration, kind.isPlanar ? "1" : "0");
         image.with(DCM_SOPClassUID, UID_SecondaryCaptureImageStorage).with(DCM_SOPInstanceUID, "1.2.3");
         image.data(DcmTag(DCM_PixelData, kind.bitsAllocated > 8 ? EVR_OW : EVR_OB), pixels);
-        const QString path = mFolder.filePath(QStringLiteral("file.dcm"));
-        image.save(path);
-        return ByteSource::ofFile(path);
+        image.save(path());
+        return ByteSource::ofFile(path());
     }
 
     /// What a decoder has to give: samples side by side, none of them shared.
@@ -157,21 +150,18 @@ protected:
         }
         return expected.isEmpty() ? pixels : expected;
     }
-
-    QTemporaryDir mFolder;
 };
 
-TEST_P(EncodedKinds, HaveTheSamePixelsInEverySyntax)
+TEST_P(EncodedKinds, HaveTheSamePixelsInEverySyntaxAndFromOneIntoAnother)
 {
     const QByteArray pixels = noise();
+    const QByteArray wanted = sideBySide(pixels);
     ByteSource stored = source(pixels);
     FrameIndex index;
     ASSERT_TRUE(index.read(stored).good());
-    QVector<QByteArray> wanted;
-    for (const char* uid : GetParam().encodings)
-        wanted.append(uid);
-    EXPECT_EQ(index.encodings(), wanted);
-    for (const QByteArray& uid : wanted) {
+    const QVector<QByteArray> encodings(GetParam().encodings.begin(), GetParam().encodings.end());
+    EXPECT_EQ(index.encodings(), encodings);
+    for (const QByteArray& uid : encodings) {
         const QByteArray made = fileIn(uid, stored, index);
         OFString photometric;
         ByteSource again(made);
@@ -182,42 +172,15 @@ TEST_P(EncodedKinds, HaveTheSamePixelsInEverySyntax)
         // DCMTK's RLE knows no single bits.
         QByteArray decoded = GetParam().bitsAllocated == 1 ? allOf(DecodedPixels(again, encoded))
                                                            : pixelsByDcmtk(made, photometric);
-        decoded.truncate(sideBySide(pixels).size());
-        EXPECT_EQ(decoded.toHex(), sideBySide(pixels).toHex()) << uid.constData();
+        EXPECT_EQ(decoded.left(wanted.size()).toHex(), wanted.toHex()) << uid.constData();
         const OFString meant = sharesChroma() ? "YBR_FULL" : GetParam().photometric;
         EXPECT_TRUE(photometric == meant || GetParam().bitsAllocated == 1) << photometric;
-    }
-}
-
-/// Decoding here makes RGB of YBR, and leaves out what lies beside the value.
-std::vector<Kind> kindsThatStay()
-{
-    std::vector<Kind> kinds;
-    std::copy_if(std::begin(kKinds), std::end(kKinds), std::back_inserter(kinds), [](const Kind& kind) {
-        return !QByteArray(kind.photometric).startsWith("YBR") && kind.bitsStored == kind.bitsAllocated;
-    });
-    return kinds;
-}
-
-class RecodedKinds : public EncodedKinds
-{
-};
-
-TEST_P(RecodedKinds, GoFromOneCompressionIntoAnother)
-{
-    const QByteArray pixels = noise();
-    ByteSource stored = source(pixels);
-    FrameIndex index;
-    ASSERT_TRUE(index.read(stored).good());
-    for (const QByteArray& uid : index.encodings()) {
-        ByteSource again(fileIn(uid, stored, index));
-        FrameIndex encoded;
-        ASSERT_TRUE(encoded.read(again).good());
+        // Decoding here makes RGB of YBR, and leaves out what lies beside the value.
         for (const QByteArray& other : encoded.encodings()) {
-            OFString photometric;
-            QByteArray decoded = pixelsByDcmtk(fileIn(other, again, encoded), photometric);
-            decoded.truncate(pixels.size());
-            EXPECT_EQ(decoded.toHex(), sideBySide(pixels).toHex())
+            if (isYbr() || GetParam().bitsStored != GetParam().bitsAllocated)
+                continue;
+            decoded = pixelsByDcmtk(fileIn(other, again, encoded), photometric);
+            EXPECT_EQ(decoded.left(wanted.size()).toHex(), wanted.toHex())
                 << uid.constData() << " to " << other.constData();
         }
     }
@@ -226,48 +189,37 @@ TEST_P(RecodedKinds, GoFromOneCompressionIntoAnother)
 INSTANTIATE_TEST_SUITE_P(All, EncodedKinds, testing::ValuesIn(kKinds),
                          [](const auto& each) { return each.param.name; });
 
-INSTANTIATE_TEST_SUITE_P(All, RecodedKinds, testing::ValuesIn(kindsThatStay()),
-                         [](const auto& each) { return each.param.name; });
+using EncodedRealImages = RealImages;
 
-TEST(EncodedPixels, OfRealFilesAreThoseThatDecodingGives)
+TEST_F(EncodedRealImages, HaveThePixelsThatDecodingGives)
 {
-    if (realFilesFolder().isEmpty())
-        GTEST_SKIP() << "KDD_TEST_DATA is not set";
     std::map<QByteArray, int> made;
-    for (const QString& path :
-         realFiles("transfer-syntaxes") + realFiles("multiframe") + realFiles("modalities")) {
-        ByteSource source = ByteSource::ofFile(path);
-        QByteArray converted;
-        FrameIndex index;
-        if (index.read(source).bad() && readAsRegularFile(path.toLocal8Bit(), converted).good())
-            source = ByteSource(converted);
+    forEach({"transfer-syntaxes", "multiframe", "modalities"}, [&](const QString& path, RealImage& real) {
         // Beside long ones, one whose frame is smaller than its image, and one that is no whole codestream.
-        if (index.read(source).bad() || index.frames() > 20 || source.size() > 400000 ||
+        if (real.index.frames() > 20 || real.source.size() > 400000 ||
             path.endsWith(QLatin1String("multiframe/sc/multiframe.dcm")) ||
             path.endsWith(QLatin1String("JPEG2000-embedded-sequence-delimiter.dcm")))
-            continue;
-        for (const QByteArray& syntax : index.encodings()) {
-            ByteSource again(fileIn(syntax, source, index));
+            return;
+        for (const QByteArray& syntax : real.index.encodings()) {
+            ByteSource again(fileIn(syntax, real.source, real.index));
             FrameIndex encoded;
-            ASSERT_TRUE(encoded.read(again).good()) << qPrintable(path);
-            ASSERT_EQ(encoded.frames(), index.frames()) << qPrintable(path);
+            ASSERT_TRUE(encoded.read(again).good());
+            ASSERT_EQ(encoded.frames(), real.index.frames());
             OFString photometric;
-            QByteArray whole = pixelsByDcmtk(again.bytes(), photometric);
-            QByteArray expected = pixelsByDcmtk(fileIn("1.2.840.10008.1.2.1", source, index), photometric);
-            DcmFileFormat native;
+            const QByteArray whole = pixelsByDcmtk(again.bytes(), photometric);
+            const QByteArray expected =
+                pixelsByDcmtk(fileIn("1.2.840.10008.1.2.1", real.source, real.index), photometric);
             Uint16 planar = 0;
-            readDicomBuffer(source.bytes(), native);
-            native.getDataset()->findAndGetUint16(DCM_PlanarConfiguration, planar);
+            real.file.getDataset()->findAndGetUint16(DCM_PlanarConfiguration, planar);
             // What is laid out in another way is compared above.
             if (whole.isNull() || planar == 1 || photometric.find("_422") != OFString_npos)
                 continue;
-            EXPECT_TRUE(whole == expected) << qPrintable(path) << ' ' << syntax.constData();
+            EXPECT_TRUE(whole == expected) << syntax.constData();
             ++made[syntax];
         }
-    }
-    EXPECT_GT(made[kRle], 50);
-    EXPECT_GT(made[kJpeg], 50);
-    EXPECT_GT(made[kJpegLs], 50);
+    });
+    for (const char* syntax : {kRle, kJpeg, kJpegLs})
+        EXPECT_GT(made[syntax], 50) << syntax;
 }
 
 }  // namespace

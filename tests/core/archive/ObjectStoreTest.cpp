@@ -9,14 +9,13 @@
 #include "support/LogCapture.h"
 #include "support/Process.h"
 #include "support/TemporaryStore.h"
+#include "support/Threads.h"
 
 #include <QDir>
 #include <QDirIterator>
 
 #include <gtest/gtest.h>
 #include <libdeflate.h>
-
-#include <thread>
 
 using namespace Kdd;
 
@@ -69,120 +68,19 @@ protected:
         return studies.toList().join(' ').toStdString();
     }
 
+    /// Of the study "1.2", as its tag file has them.
+    static QList<QByteArray> images()
+    {
+        TagFile file;
+        EXPECT_TRUE(file.readCacheFileForStudy("1.2", false));
+        return file.imagesByUID().keys();
+    }
+
     LogCapture mLog;
     TemporaryStore mFolder;
     QByteArray mAddress = "sqlite:" + mFolder.filePath("kdd.sqlite").toUtf8();
     ObjectRules mRules;
 };
-
-TEST_F(ObjectStoreTest, LeavesAStudyThatWaitsAndCompletesIt)
-{
-    ArrivedStudies studies({std::chrono::milliseconds(0), std::chrono::milliseconds(0)});
-    const auto database = openCatalogue();
-    const auto objects = open(studies);
-    for (const char* uid : {"1.2.3.1", "1.2.3.2"})
-        EXPECT_EQ(store(*objects, *database, anImage(uid)).reason.toStdString(), "");
-    EXPECT_EQ(waiting(), "1.2");
-    QByteArray due;
-    ASSERT_TRUE(studies.awaitDue(due));
-    EXPECT_EQ(due, "1.2");
-    ASSERT_TRUE(studies.complete(due, *database, 0).good());
-    EXPECT_FALSE(studies.isWaiting("1.2"));
-    EXPECT_EQ(waiting(), "");
-    TagFile file;
-    ASSERT_TRUE(file.readCacheFileForStudy("1.2", false));
-    EXPECT_EQ(file.imagesByUID().keys(), (QList<QByteArray>{"1.2.3.1", "1.2.3.2"}));
-    EXPECT_EQ(filesBelow("objects/1.2"),
-              (QStringList{QStringLiteral("1.2.3/1.2.3.1.dcm"), QStringLiteral("1.2.3/1.2.3.2.dcm")}));
-}
-
-TEST_F(ObjectStoreTest, MergesArrivalsWithoutOpeningTheirFilesAgain)
-{
-    ArrivedStudies studies;
-    const auto database = openCatalogue();
-    const auto objects = open(studies);
-    store(*objects, *database, anImage("1.2.3.1"));
-    ASSERT_TRUE(studies.complete("1.2", *database, 0).good());
-    store(*objects, *database, anImage("1.2.3.2"));
-    store(*objects, *database, anImage("1.2.3.3"));
-    // A build would miss them.
-    QDir(mFolder.filePath("objects/1.2")).removeRecursively();
-    ASSERT_TRUE(studies.complete("1.2", *database, 0).good());
-    TagFile file;
-    ASSERT_TRUE(file.readCacheFileForStudy("1.2", false));
-    EXPECT_EQ(file.imagesByUID().size(), 3);
-}
-
-TEST_F(ObjectStoreTest, MergesWhatAnotherServerTookAlongAndThatOneHasNothingLeft)
-{
-    ArrivedStudies one;
-    ArrivedStudies other;
-    const auto database = openCatalogue();
-    const auto objectsOfOne = open(one);
-    const auto objectsOfOther = open(other);
-    for (const char* uid : {"1.2.3.1", "1.2.3.2", "1.2.3.3"})
-        store(*objectsOfOne, *database, anImage(uid));
-    ASSERT_TRUE(one.complete("1.2", *database, 0).good());
-    // A build would not be whole any more.
-    QFile::remove(mFolder.filePath("objects/1.2/1.2.3/1.2.3.1.dcm"));
-    const auto expectHeld = [&](ArrivedStudies& by, int images) {
-        EXPECT_TRUE(by.complete("1.2", *database, 0).good());
-        TagFile file;
-        ASSERT_TRUE(file.readCacheFileForStudy("1.2", false));
-        EXPECT_EQ(file.imagesByUID().size(), images);
-        return;
-    };
-    store(*objectsOfOne, *database, anImage("1.2.3.4"));
-    store(*objectsOfOther, *database, anImage("1.2.3.5"));
-    expectHeld(one, 5);
-    store(*objectsOfOne, *database, anImage("1.2.3.6"));
-    expectHeld(other, 6);
-    EXPECT_FALSE(other.isWaiting("1.2"));
-    const QByteArray written = fileContent(TagFile::cacheFilePathForStudy("1.2"));
-    expectHeld(one, 6);
-    EXPECT_EQ(fileContent(TagFile::cacheFilePathForStudy("1.2")), written);
-    EXPECT_EQ(waiting(), "");
-}
-
-TEST_F(ObjectStoreTest, TakesWhatTwoSendInOppositeOrderOnce)
-{
-    ArrivedStudies studies;
-    const auto objects = open(studies);
-    openCatalogue();
-    const auto send = [&](bool isReversed) {
-        std::vector<std::unique_ptr<ObjectArrival>> arrivals;
-        for (int i = 0; i < 40; ++i) {
-            // Each twice, too.
-            const int number = (isReversed ? 39 - i : i) / 2;
-            const QByteArray bytes = anImage("1.2.3." + QByteArray::number(number)).file();
-            arrivals.push_back(objects->begin());
-            arrivals.back()->take(bytes.constData(), bytes.size());
-        }
-        for (const ArrivedObject& object : objects->commit(arrivals, *openCatalogue()))
-            EXPECT_TRUE(object.isStored()) << object.reason.toStdString();
-    };
-    std::thread other([&] { send(true); });
-    send(false);
-    other.join();
-    EXPECT_EQ(filesBelow("objects/1.2").size(), 20);
-}
-
-TEST_F(ObjectStoreTest, LeavesAloneWhatAnotherProcessCompletes)
-{
-    ArrivedStudies studies;
-    const auto database = openCatalogue();
-    const auto objects = open(studies);
-    store(*objects, *database, anImage("1.2.3.1"));
-    {
-        const auto other = openCatalogue();
-        std::unique_ptr<Kxg::StudyClaim> claim;
-        ASSERT_TRUE(other->claim("1.2", 0, claim).good());
-        EXPECT_TRUE(studies.complete("1.2", *database, 10).bad());
-        EXPECT_TRUE(studies.isWaiting("1.2"));
-    }
-    EXPECT_TRUE(studies.complete("1.2", *database, 0).good());
-    EXPECT_FALSE(studies.isWaiting("1.2"));
-}
 
 TEST_F(ObjectStoreTest, TakesInOrRemovesWhatAServerLeftThatDied)
 {
@@ -202,12 +100,12 @@ TEST_F(ObjectStoreTest, TakesInOrRemovesWhatAServerLeftThatDied)
     const QString left = mFolder.filePath("objects/.incoming/") + staging;
     const QString series = mFolder.filePath("objects/1.2/1.2.3/");
     // The others have a place, and were registered or not.
+    int number = 70;
     const auto leave = [&](const char* image, const char* place, const QByteArray& bytes,
                            const QByteArray& whole) {
-        static int sNumber = 70;
         const auto checksum = libdeflate_crc32(0, whole.constData(), static_cast<std::size_t>(whole.size()));
         const QString name = left + QStringLiteral("/%1=%2=1.2=1.2.3=%3")
-                                        .arg(++sNumber)
+                                        .arg(++number)
                                         .arg(checksum, 0, 16)
                                         .arg(QLatin1String(image));
         const QByteArray staged = name.toUtf8();
@@ -243,11 +141,107 @@ TEST_F(ObjectStoreTest, TakesInOrRemovesWhatAServerLeftThatDied)
     EXPECT_TRUE(arriving->take("more", 4)) << "what still lives is left alone";
 }
 
-TEST_F(ObjectStoreTest, TellsThatTheDiskIsFullAndLeavesNothing)
+/// With a store that is open.
+class StoredObjects : public ObjectStoreTest
 {
-    ArrivedStudies studies;
-    const auto database = openCatalogue();
-    const auto objects = open(studies);
+protected:
+    using ObjectStoreTest::store;
+    ArrivedObject store(const char* uid) { return store(*objects, *database, anImage(uid)); }
+
+    bool completes(ArrivedStudies& by, int patience = 0)
+    {
+        return by.complete("1.2", *database, patience).good();
+    }
+
+    const std::unique_ptr<Kxg::Catalogue> database = openCatalogue();
+    ArrivedStudies studies{{std::chrono::milliseconds(0), std::chrono::milliseconds(0)}};
+    const std::unique_ptr<ObjectStore> objects = open(studies);
+};
+
+TEST_F(StoredObjects, LeaveAStudyThatWaitsAndCompleteIt)
+{
+    for (const char* uid : {"1.2.3.1", "1.2.3.2"})
+        EXPECT_EQ(store(uid).reason.toStdString(), "");
+    EXPECT_EQ(waiting(), "1.2");
+    QByteArray due;
+    ASSERT_TRUE(studies.awaitDue(due));
+    EXPECT_EQ(due, "1.2");
+    ASSERT_TRUE(completes(studies));
+    EXPECT_FALSE(studies.isWaiting("1.2"));
+    EXPECT_EQ(waiting(), "");
+    EXPECT_EQ(images(), (QList<QByteArray>{"1.2.3.1", "1.2.3.2"}));
+    EXPECT_EQ(filesBelow("objects/1.2").join(QLatin1Char(' ')).toStdString(),
+              "1.2.3/1.2.3.1.dcm 1.2.3/1.2.3.2.dcm");
+}
+
+TEST_F(StoredObjects, AreMergedWithoutTheirFilesBeingOpenedAgain)
+{
+    store("1.2.3.1");
+    ASSERT_TRUE(completes(studies));
+    store("1.2.3.2");
+    store("1.2.3.3");
+    // A build would miss them.
+    QDir(mFolder.filePath("objects/1.2")).removeRecursively();
+    ASSERT_TRUE(completes(studies));
+    EXPECT_EQ(images().size(), 3);
+}
+
+TEST_F(StoredObjects, OfAnotherServerAreMergedAlongAndThatOneHasNothingLeft)
+{
+    ArrivedStudies other;
+    const auto objectsOfOther = open(other);
+    for (const char* uid : {"1.2.3.1", "1.2.3.2", "1.2.3.3"})
+        store(uid);
+    ASSERT_TRUE(completes(studies));
+    // A build would not be whole any more.
+    QFile::remove(mFolder.filePath("objects/1.2/1.2.3/1.2.3.1.dcm"));
+    store("1.2.3.4");
+    store(*objectsOfOther, *database, anImage("1.2.3.5"));
+    EXPECT_TRUE(completes(studies));
+    EXPECT_EQ(images().size(), 5);
+    store("1.2.3.6");
+    EXPECT_TRUE(completes(other));
+    EXPECT_EQ(images().size(), 6);
+    EXPECT_FALSE(other.isWaiting("1.2"));
+    const QByteArray written = fileContent(TagFile::cacheFilePathForStudy("1.2"));
+    EXPECT_TRUE(completes(studies));
+    EXPECT_EQ(fileContent(TagFile::cacheFilePathForStudy("1.2")), written);
+    EXPECT_EQ(waiting(), "");
+}
+
+TEST_F(StoredObjects, ThatTwoSendInOppositeOrderAreTakenOnce)
+{
+    onThreads(2, [&](int thread) {
+        std::vector<std::unique_ptr<ObjectArrival>> arrivals;
+        for (int i = 0; i < 40; ++i) {
+            // Each twice, too.
+            const int number = (thread == 1 ? 39 - i : i) / 2;
+            const QByteArray bytes = anImage("1.2.3." + QByteArray::number(number)).file();
+            arrivals.push_back(objects->begin());
+            arrivals.back()->take(bytes.constData(), bytes.size());
+        }
+        for (const ArrivedObject& object : objects->commit(arrivals, *openCatalogue()))
+            EXPECT_TRUE(object.isStored()) << object.reason.toStdString();
+    });
+    EXPECT_EQ(filesBelow("objects/1.2").size(), 20);
+}
+
+TEST_F(StoredObjects, AreLeftAloneWhileAnotherProcessCompletesThem)
+{
+    store("1.2.3.1");
+    {
+        const auto other = openCatalogue();
+        std::unique_ptr<Kxg::StudyClaim> claim;
+        ASSERT_TRUE(other->claim("1.2", 0, claim).good());
+        EXPECT_FALSE(completes(studies, 10));
+        EXPECT_TRUE(studies.isWaiting("1.2"));
+    }
+    EXPECT_TRUE(completes(studies));
+    EXPECT_FALSE(studies.isWaiting("1.2"));
+}
+
+TEST_F(StoredObjects, LeaveNothingWhenTheDiskIsFull)
+{
     const DatasetBuilder large = anImage("1.2.3.1").words(std::vector<Uint16>(100000, 7));
     const QByteArray bytes = large.file();
     {
@@ -266,14 +260,11 @@ TEST_F(ObjectStoreTest, TellsThatTheDiskIsFullAndLeavesNothing)
     EXPECT_EQ(store(*careful, *database, anImage("1.2.3.2")).fault, ArrivalFault::OutOfSpace);
 }
 
-TEST_F(ObjectStoreTest, ReplacesWhatCannotBeReadAnyMore)
+TEST_F(StoredObjects, ThatCannotBeReadAnyMoreAreReplaced)
 {
-    ArrivedStudies studies;
-    const auto database = openCatalogue();
-    const auto objects = open(studies);
-    store(*objects, *database, anImage("1.2.3.1"));
+    store("1.2.3.1");
     putFile(mFolder.filePath("objects/1.2/1.2.3/1.2.3.1.dcm"), "spoilt");
-    EXPECT_TRUE(store(*objects, *database, anImage("1.2.3.1")).isStored());
+    EXPECT_TRUE(store("1.2.3.1").isStored());
     QVector<Kxg::KeptFile> files;
     ASSERT_TRUE(database->imageFiles("1.2", "1.2.3.1", files).good());
     EXPECT_TRUE(files.value(0).path.endsWith("/1.2.3.1_0002.dcm") && files.value(0).isShown);

@@ -9,20 +9,14 @@
 #include "kddlib/archive/WorkObserver.h"
 #include "kddlib/tagfile/TagFile.h"
 #include "kddlib/volumes/VolumeInfo.h"
-#include "platform/database/Kxg.h"
 #include "platform/database/StudyProofs.h"
 #include "platform/volumefile/OrlanMesh.h"
 #include "support/DatasetBuilder.h"
+#include "support/EngineTest.h"
 #include "support/FileContent.h"
-#include "support/LogCapture.h"
-#include "support/PostgresServer.h"
 #include "support/Setting.h"
-#include "support/TemporaryStore.h"
 
 #include <QFile>
-#include <QThread>
-
-#include <gtest/gtest.h>
 
 #include <atomic>
 #include <thread>
@@ -77,16 +71,9 @@ QByteArray shownOf(const QByteArray& path)
     return shown + dicomValue(*mesh, "G0020-000E");
 }
 
-class StudyProofTest : public testing::TestWithParam<const char*>
+class StudyProofTest : public EngineTest
 {
 protected:
-    StudyProofTest()
-    {
-        Kxg::SetDatabaseServer(mAddress);
-        mCatalogue = openCatalogue();
-    }
-    ~StudyProofTest() override { Kxg::SetDatabaseServer(QByteArray()); }
-
     QString save(const DatasetBuilder& image, const char* name) const
     {
         const QString path = mFiles.filePath(QString::fromLatin1(name));
@@ -119,72 +106,72 @@ protected:
     }
 
     /// What the proof tells of the study's tag file, or of its other files, in place of what was told before.
-    StudyProof::Findings ofTagFile(bool heals = false, const char* study = "1.1")
+    StudyProof::Findings ofTagFile(bool heals = false)
     {
-        mTold.clear();
         StudyProof::Rules rules;
         rules.heals = heals;
-        StudyProof proof(*mCatalogue, rules,
-                         [this](const QString& fault) { mTold += fault.toStdString() + '\n'; });
-        EXPECT_TRUE(proof.checkTagFile(study).good());
-        return proof.findings();
+        return proved(rules, [](StudyProof& proof) { return proof.checkTagFile("1.1"); });
     }
     StudyProof::Findings ofFiles(bool records = false, const char* study = "1.1")
     {
-        mTold.clear();
         StudyProof::Rules rules;
         rules.records = records;
+        bool isDone = false;
+        const StudyProof::Findings findings = proved(rules, [&](StudyProof& proof) {
+            QByteArray position;
+            return proof.checkFiles(study, position, isDone);
+        });
+        EXPECT_TRUE(isDone);
+        return findings;
+    }
+
+    template <typename Check>
+    StudyProof::Findings proved(const StudyProof::Rules& rules, const Check& check)
+    {
+        mTold.clear();
         StudyProof proof(*mCatalogue, rules,
                          [this](const QString& fault) { mTold += fault.toStdString() + '\n'; });
-        QByteArray position;
-        bool isDone = false;
-        EXPECT_TRUE(proof.checkFiles(study, position, isDone).good());
-        EXPECT_TRUE(isDone);
+        EXPECT_TRUE(check(proof).good());
         return proof.findings();
     }
 
     bool isTold(const char* what) const { return mTold.find(what) != std::string::npos; }
 
-    /// Looks until it is so, for as long as it takes on a busy machine.
-    template <typename Condition>
-    static bool comesTrue(const Condition& condition)
+    /// Calls `look` with a bit of the file flipped, for every byte or each that is so many later.
+    template <typename Look>
+    void forEachFlip(const QString& path, qint64 step, const Look& look)
     {
-        for (int look = 0; look < 6000 && !condition(); ++look)
-            QThread::msleep(1);
-        return condition();
+        for (qint64 at = 0; at < QFile(path).size() && !HasFatalFailure(); at += step) {
+            SCOPED_TRACE(at);
+            flipBit(path, at);
+            look();
+            flipBit(path, at);
+        }
     }
 
-    LogCapture mLog;
-    TemporaryStore mStore;
+    const qint64 mStep = isSqlite() ? kStep : 101;  // from one flip to the next [bytes]
     QTemporaryDir mFiles;
-    QByteArray mAddress = QByteArray(GetParam()) == "Sqlite"
-                              ? "sqlite:" + mStore.filePath("kdd.sqlite").toUtf8()
-                              : newPostgresDatabase();
     WorkObserver mObserver;
-    std::unique_ptr<Kxg::Catalogue> mCatalogue;
+    std::unique_ptr<Kxg::Catalogue> mCatalogue = openCatalogue();
     std::string mTold;
 };
 
-INSTANTIATE_TEST_SUITE_P(Engines, StudyProofTest, testing::Values("Sqlite", "Postgres"),
-                         [](const auto& engine) { return engine.param; });
+INSTANTIATE_TEST_SUITE_P(Engines, StudyProofTest, EngineTest::engines(), EngineTest::nameOf);
 
 // ---- tag files
 
 TEST_P(StudyProofTest, EveryByteOfATagFileCounts)
 {
     fill();
-    const qint64 size = QFile(tagFile()).size();
     TagFile file;
     ASSERT_TRUE(file.readCacheFileForStudy("1.1", false));
     ASSERT_GT(file.statistics().blobs, 0);
     ASSERT_GT(file.statistics().volumes, 0);
     ASSERT_EQ(ofTagFile().tagFiles, 1);
-    for (qint64 at = 0; at < size; at += QByteArray(GetParam()) == "Sqlite" ? kStep : 101) {
-        flipBit(tagFile(), at);
-        ASSERT_EQ(ofTagFile().faults, 1) << at;
-        ASSERT_TRUE(isTold("is damaged")) << at << mTold;
-        flipBit(tagFile(), at);
-    }
+    forEachFlip(tagFile(), mStep, [this] {
+        ASSERT_EQ(ofTagFile().faults, 1);
+        ASSERT_TRUE(isTold("is damaged")) << mTold;
+    });
     EXPECT_EQ(ofTagFile().faults, 0) << mTold;
     // What a longer study left behind its end says nothing.
     QFile longer(tagFile());
@@ -278,12 +265,10 @@ TEST_P(StudyProofTest, EveryByteOfADicomFileCountsOnceItHasADigest)
     EXPECT_EQ(ofFiles(true).recorded, 4);
     EXPECT_EQ(ofFiles().undigested, 0);
     const QString path = mFiles.filePath(QStringLiteral("2"));
-    for (qint64 at = 0; at < QFile(path).size(); at += QByteArray(GetParam()) == "Sqlite" ? kStep : 101) {
-        flipBit(path, at);
-        ASSERT_EQ(ofFiles().faults, 1) << at;
+    forEachFlip(path, mStep, [this] {
+        ASSERT_EQ(ofFiles().faults, 1);
         ASSERT_TRUE(isTold("/2 is damaged: its bytes have changed")) << mTold;
-        flipBit(path, at);
-    }
+    });
     EXPECT_EQ(ofFiles().faults, 0) << mTold;
     flipBit(path, QFile(path).size() - 2, Clock::Now);
     EXPECT_EQ(ofFiles(true).faults, 1);
@@ -302,23 +287,16 @@ TEST_P(StudyProofTest, AFlipInAVolumeFileIsNoticedOrHarmless)
     const QByteArray path = volume();
     const QByteArray shown = shownOf(path);
     ASSERT_FALSE(shown.isEmpty());
-    const qint64 size = QFile(QString::fromUtf8(path)).size();
     int noticed = 0;
-    for (qint64 at = 0; at < size; at += QByteArray(GetParam()) == "Sqlite" ? kStep : 101) {
-        flipBit(QString::fromUtf8(path), at);
+    forEachFlip(QString::fromUtf8(path), mStep, [&] {
         const int faults = ofFiles().faults;
         noticed += faults;
-        ASSERT_TRUE(faults == 1 || shownOf(path) == shown) << at;
-        flipBit(QString::fromUtf8(path), at);
-    }
+        ASSERT_TRUE(faults == 1 || shownOf(path) == shown);
+    });
     EXPECT_GT(noticed, 0);
     // By its digest every byte counts.
     EXPECT_EQ(ofFiles(true).recorded, 4);
-    for (qint64 at = 0; at < size; at += 41) {
-        flipBit(QString::fromUtf8(path), at);
-        ASSERT_EQ(ofFiles().faults, 1) << at;
-        flipBit(QString::fromUtf8(path), at);
-    }
+    forEachFlip(QString::fromUtf8(path), 41, [this] { ASSERT_EQ(ofFiles().faults, 1); });
 }
 
 // ---- in the background

@@ -4,17 +4,10 @@
 #include "kddlib/archive/DicomInput.h"
 #include "kddlib/archive/Registration.h"
 #include "kddlib/tagfile/TagFile.h"
-#include "platform/database/Kxg.h"
 #include "support/DatasetBuilder.h"
-#include "support/FileContent.h"
-#include "support/LogCapture.h"
-#include "support/PostgresServer.h"
-#include "support/TemporaryStore.h"
+#include "support/EngineTest.h"
 
 #include <QFile>
-#include <QThread>
-
-#include <gtest/gtest.h>
 
 #include <array>
 
@@ -27,11 +20,9 @@ constexpr StudyWorkers::Pace kSwift = {std::chrono::milliseconds(20), std::chron
                                        std::chrono::milliseconds(0), std::chrono::milliseconds(20),
                                        std::chrono::milliseconds(20)};
 
-class StudyWorkersTest : public testing::TestWithParam<const char*>
+class StudyWorkersTest : public EngineTest
 {
 protected:
-    StudyWorkersTest() { Kxg::SetDatabaseServer(mAddress); }
-
     /// Of the study "1.N" as many images.
     void index(int study, int images) const
     {
@@ -53,25 +44,9 @@ protected:
         EXPECT_TRUE(openCatalogue()->countWaiting(waiting).good());
         return waiting;
     }
-
-    /// Looks until it is so, for as long as it takes on a busy machine.
-    template <typename Condition>
-    static bool comesTrue(const Condition& condition)
-    {
-        for (int look = 0; look < 6000 && !condition(); ++look)
-            QThread::yieldCurrentThread();
-        return condition();
-    }
-
-    LogCapture mLog;
-    TemporaryStore mStore;
-    QByteArray mAddress = QByteArray(GetParam()) == "Sqlite"
-                              ? "sqlite:" + mStore.filePath("kdd.sqlite").toUtf8()
-                              : newPostgresDatabase();
 };
 
-INSTANTIATE_TEST_SUITE_P(Engines, StudyWorkersTest, testing::Values("Sqlite", "Postgres"),
-                         [](const auto& engine) { return engine.param; });
+INSTANTIATE_TEST_SUITE_P(Engines, StudyWorkersTest, EngineTest::engines(), EngineTest::nameOf);
 
 TEST_P(StudyWorkersTest, CompleteWhatWaitsAndWhatComesToWait)
 {
@@ -119,7 +94,6 @@ TEST_P(StudyWorkersTest, TryAgainWhatFailedAndGoOnWithOthers)
 
 TEST_P(StudyWorkersTest, GoOnWhenTheDatabaseIsThereAgain)
 {
-    const bool isFile = mAddress.startsWith("sqlite:");
     const QString file = mStore.filePath("kdd.sqlite");
     const QString away = mStore.filePath("away");
     // Its log is never without it.
@@ -131,10 +105,10 @@ TEST_P(StudyWorkersTest, GoOnWhenTheDatabaseIsThereAgain)
     StudyWorkers workers(2, kSwift);
     workers.start();
     EXPECT_TRUE(comesTrue([this] { return countWaiting() == 0; }));
-    isFile ? moveFiles(file, away, {"", "-wal", "-shm"}) : stopPostgres();
+    isSqlite() ? moveFiles(file, away, {"", "-wal", "-shm"}) : stopPostgres();
     while (mLog.count("Waiting for the database") == 0)
         QThread::yieldCurrentThread();
-    isFile ? moveFiles(away, file, {"-wal", "-shm", ""}) : startPostgres();
+    isSqlite() ? moveFiles(away, file, {"-wal", "-shm", ""}) : startPostgres();
     index(2, 1);
     EXPECT_TRUE(comesTrue([this] { return countWaiting() == 0; }));
     EXPECT_TRUE(comesTrue([this] { return countWaiting() == 0 && mLog.count("answers again") == 1; }));

@@ -1,12 +1,9 @@
 #include "CatalogueFixture.h"
-#include "support/FileContent.h"
 #include "support/HttpServer.h"
 #include "support/ObjectServer.h"
 
 #include <QProcess>
 #include <QStandardPaths>
-
-#include <gtest/gtest.h>
 
 namespace Kdd
 {
@@ -78,7 +75,7 @@ TEST_F(Examples, SaveASyncedTagFile)
     EXPECT_EQ(printed, std::to_string(fileContent(target()).size()) + " bytes\n0");
     TagFile file;
     ASSERT_TRUE(file.readCacheFile(target(), "1.2", false));
-    EXPECT_EQ(file.imagesByUID().keys(), QList<QByteArray>{"2"});
+    EXPECT_EQ(file.imagesByUID().keys(), Uids{"2"});
     EXPECT_EQ(run(KDD_SYNCED_TAG_FILE, {database, QStringLiteral("9"), target()}), "1");
 }
 

@@ -1,14 +1,10 @@
 #include "CatalogueFixture.h"
 #include "kddlib/capi/kddtagfile.h"
-#include "kddlib/tagfile/TagFile.h"
 #include "kddlib/tagfile/TagFileRemoval.h"
 #include "platform/base/LogFile.h"
 #include "platform/os/ExclusiveFile.h"
 #include "support/LogCapture.h"
 
-#include <QFile>
-
-#include <gtest/gtest.h>
 #include <syslog.h>
 
 #include <cstdarg>
@@ -77,8 +73,8 @@ TEST_F(TagFileInterface, ImagesAndSeriesAreRemovedAndWithTheLastTheFile)
 {
     EXPECT_TRUE(DeleteImagesInTagFile("1.2", 0, nullptr));
     EXPECT_TRUE(DeleteImagesInTagFile("1.2", 3, uids));
-    EXPECT_EQ(imagesInFile("1.2"), QList<QByteArray>{"2"});
-    const char* series[] = {"1.2.3"};
+    EXPECT_EQ(imagesIn("1.2"), Uids{"2"});
+    const char* series[] = {"1.2.1"};
     EXPECT_TRUE(DeleteSeriesInTagFile("1.2", 1, series));
     EXPECT_FALSE(QFile::exists(path()));
 }
@@ -104,7 +100,7 @@ TEST_F(TagFileInterface, AFileThatOthersHoldStaysAndALineSaysSo)
     EXPECT_FALSE(DeleteTagFile("1.2"));
     EXPECT_EQ(log.count("Tag file " + path().toStdString() + " could not be deleted (errno 11)"), 1);
     held.close();
-    EXPECT_EQ(imagesInFile("1.2").size(), 3);
+    EXPECT_EQ(imagesIn("1.2").size(), 3);
 }
 
 TEST(TagFileRemoval, IsTriedSixTimes)
@@ -133,7 +129,7 @@ TEST_F(TagFileInterface, AStudyOfBothTheDatabaseAndATagFileIsSynced)
     EXPECT_TRUE(isSynced("1.2", "user"));
     EXPECT_FALSE(isSynced("1.3") || isSynced("5.5"));
     EXPECT_EQ(log.count("Loaded and synced tag file for study 1.2 ("), 1);
-    EXPECT_EQ(imagesInFile("1.2").size(), 3) << "the file stays as it is";
+    EXPECT_EQ(imagesIn("1.2").size(), 3) << "the file stays as it is";
 }
 
 TEST_F(TagFileInterface, NullsAndNegativeCountsAreRefusedWithALineEach)
@@ -154,7 +150,7 @@ TEST_F(TagFileInterface, NullsAndNegativeCountsAreRefusedWithALineEach)
     EXPECT_EQ(ReadAndSyncTagFileData("1.2", nullptr, &size, nullptr), nullptr);
     EXPECT_EQ(log.count(" must not be "), 12);
     EXPECT_EQ(log.lines().size(), 12U);
-    EXPECT_EQ(imagesInFile("1.2").size(), 3);
+    EXPECT_EQ(imagesIn("1.2").size(), 3);
 }
 
 /// In a process of its own, for the log is the process's.

@@ -5,10 +5,6 @@
 #include "support/LogCapture.h"
 #include "support/Setting.h"
 
-#include <QFile>
-
-#include <gtest/gtest.h>
-
 namespace Kdd
 {
 namespace
@@ -33,14 +29,7 @@ protected:
             EXPECT_TRUE(cache.storeBuffer(name, "x").good());
     }
 
-    static QByteArray textOf(const char* image, const DcmTagKey& key)
-    {
-        TagFile file;
-        QByteArray text;
-        EXPECT_TRUE(file.readCacheFileForStudy("1.2", false));
-        file.findImage(image)->findAndGetString(key, text);
-        return text;
-    }
+    static QByteArray textOf(const char* image, const DcmTagKey& key) { return value("1.2", image, key); }
 
     bool isCached(const char* name) const
     {

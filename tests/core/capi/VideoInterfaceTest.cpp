@@ -7,7 +7,6 @@
 #include "support/LogCapture.h"
 #include "support/RealFiles.h"
 
-#include <QTemporaryDir>
 #include <QtEndian>
 
 #include <dcmtk/dcmdata/dcpxitem.h>
@@ -28,7 +27,7 @@ QByteArray item(const QByteArray& value)
 }
 
 /// DICOM files whose pixel data stand as they are given here.
-class VideoInterface : public testing::Test
+class VideoInterface : public FileTest
 {
 protected:
     void SetUp() override { OFLog::configure(OFLogger::OFF_LOG_LEVEL); }
@@ -57,16 +56,12 @@ protected:
         uint64_t offset = 1, length = 1;
         const int result = GetVideoMetaInfo(path().toLocal8Bit().constData(), uid, &cineRate, &transferSyntax,
                                             &offset, &length);
-        const QByteArray bytes = fileContent(path()).mid(static_cast<int>(offset), static_cast<int>(length));
+        const QByteArray bytes = content().mid(static_cast<int>(offset), static_cast<int>(length));
         std::ostringstream text;
         text << uid << ' ' << cineRate << "/s " << transferSyntax << ' ';
         text << (length == 0 ? "none at " + std::to_string(offset) : bytes.toStdString());
         return {result, text.str()};
     }
-
-    QString path() const { return mFolder.filePath(QStringLiteral("video.dcm")); }
-
-    QTemporaryDir mFolder;
 };
 
 TEST_F(VideoInterface, IsToldFromWhatEncapsulatedVideosHold)
@@ -104,7 +99,7 @@ TEST_F(VideoInterface, IsToldFromWhatEncapsulatedVideosHold)
 TEST_F(VideoInterface, NoPartOfAFileIsMistakenForItsVideo)
 {
     save(movie(), item({}) + item("a video!"));
-    const QByteArray whole = fileContent(path());
+    const QByteArray whole = content();
     const LogCapture log;
     for (int size = 0; size < whole.size() - 16; ++size) {
         ASSERT_TRUE(QFile::resize(path(), size));

@@ -10,7 +10,7 @@
 #include <dcmtk/dcmdata/dctk.h>
 
 #include <memory>
-#include <ostream>
+#include <sstream>
 
 namespace Kdd
 {
@@ -48,9 +48,7 @@ std::unique_ptr<DcmDataset> utf8Dataset(const TagMap& map)
 class JsonWriter
 {
 public:
-    enum class Entries { Merged, Own };
-
-    JsonWriter(std::ostream& out, Entries entries)
+    JsonWriter(std::ostream& out, JsonEntries entries)
         : mOut(out)
         , mEntries(entries)
         , mFormat(OFFalse)
@@ -94,7 +92,7 @@ private:
 
     bool isWanted(const TagMap& map, const DcmTagKey& key) const
     {
-        return isWritten(key) && (mEntries == Entries::Merged || map.tagsForLevel().contains(key));
+        return isWritten(key) && (mEntries == JsonEntries::Merged || map.tagsForLevel().contains(key));
     }
 
     void separate(bool& isFirst)
@@ -130,22 +128,17 @@ private:
     }
 
     std::ostream& mOut;
-    Entries mEntries;
+    JsonEntries mEntries;
     DcmJsonFormatCompact mFormat;
 };
 
 }  // namespace
 
-void writeDatasetJson(std::ostream& out, const TagMap& map, const std::string& bulkDataRoot)
+std::string datasetJson(const TagMap& map, const std::string& bulkDataRoot, JsonEntries entries)
 {
-    const std::unique_ptr<DcmDataset> dataset = utf8Dataset(map);
-    JsonWriter(out, JsonWriter::Entries::Merged).object(*dataset, map, bulkDataRoot);
-}
-
-void writeOwnDatasetJson(std::ostream& out, const TagMap& map, const std::string& bulkDataRoot)
-{
-    const std::unique_ptr<DcmDataset> dataset = utf8Dataset(map);
-    JsonWriter(out, JsonWriter::Entries::Own).object(*dataset, map, bulkDataRoot);
+    std::ostringstream out;
+    JsonWriter(out, entries).object(*utf8Dataset(map), map, bulkDataRoot);
+    return out.str();
 }
 
 }  // namespace Kdd

@@ -1,6 +1,5 @@
 #pragma once
 
-#include <iosfwd>
 #include <string>
 
 namespace Kdd
@@ -8,10 +7,10 @@ namespace Kdd
 
 class TagMap;
 
-// DICOM JSON by way of a DCMTK dataset that is rebuilt from the node, converted as a whole and written by DCMTK. Slow,
-// and what the library's own writer is held against.
+enum class JsonEntries { Merged, Own };
 
-void writeDatasetJson(std::ostream& out, const TagMap& map, const std::string& bulkDataRoot);
-void writeOwnDatasetJson(std::ostream& out, const TagMap& map, const std::string& bulkDataRoot);
+/// DICOM JSON by way of a DCMTK dataset that is rebuilt from the node, converted as a whole and written by DCMTK. Slow,
+/// and what the library's own writer is held against.
+std::string datasetJson(const TagMap& map, const std::string& bulkDataRoot, JsonEntries entries);
 
 }  // namespace Kdd

@@ -1,10 +1,7 @@
 #include "kddlib/items/FrameIndex.h"
 
-#include "kddlib/items/RegularFile.h"
-#include "kddlib/net/dicom/DicomFileReader.h"
-#include "support/ByteSource.h"
 #include "support/DatasetBuilder.h"
-#include "support/RealFiles.h"
+#include "support/RealImage.h"
 
 #include <QTemporaryDir>
 #include <QtEndian>
@@ -15,7 +12,6 @@
 #include <dcmtk/dcmdata/dcrledrg.h>
 #include <dcmtk/dcmjpeg/djdecode.h>
 #include <dcmtk/dcmjpls/djdecode.h>
-#include <gtest/gtest.h>
 
 #include <set>
 
@@ -23,17 +19,6 @@ using namespace Kdd;
 
 namespace
 {
-
-/// A file's bytes in usual form, as it is or converted.
-ByteSource sourceOf(const QString& path, FrameIndex& index)
-{
-    ByteSource source = ByteSource::ofFile(path);
-    QByteArray bytes;
-    if (index.read(source).bad() && readAsRegularFile(path.toLocal8Bit(), bytes).good())
-        source = ByteSource(bytes);
-    static_cast<void>(index.read(source));
-    return source;
-}
 
 /// The fragments of a frame as DCMTK finds them; null where it cannot.
 QByteArray fragmentsByDcmtk(DcmPixelSequence& sequence, int frame, int frames)
@@ -73,45 +58,39 @@ QByteArray decodedByDcmtk(DcmDataset& dataset)
     return pixels->getPartialValue(bytes.data(), 0, pixels->getLength()).good() ? bytes : QByteArray();
 }
 
-class RealFrames : public testing::Test
+class RealFrames : public RealImages
 {
 protected:
-    void SetUp() override
+    template <typename Test>
+    static void forEach(const Test& test)
     {
-        if (realFilesFolder().isEmpty())
-            GTEST_SKIP() << "KDD_TEST_DATA is not set";
-        mPaths = realFiles("transfer-syntaxes") + realFiles("multiframe");
+        RealImages::forEach({"transfer-syntaxes", "multiframe"}, test);
     }
-
-    QStringList mPaths;
 };
 
 TEST_F(RealFrames, HaveTheFragmentsThatDcmtkFinds)
 {
     int compared = 0;
-    for (const QString& path : mPaths) {
-        FrameIndex index;
-        ByteSource source = sourceOf(path, index);
-        DcmFileFormat file;
+    forEach([&](const QString& /*path*/, RealImage& real) {
         DcmElement* element = nullptr;
-        if (!index.isEncapsulated() || readDicomBuffer(source.bytes(), file).bad())
-            continue;
-        ASSERT_TRUE(file.getDataset()->findAndGetElement(DCM_PixelData, element).good());
+        if (!real.index.isEncapsulated())
+            return;
+        ASSERT_TRUE(real.file.getDataset()->findAndGetElement(DCM_PixelData, element).good());
         auto& pixels = static_cast<DcmPixelData&>(*element);
         E_TransferSyntax xfer = EXS_Unknown;
         const DcmRepresentationParameter* parameter = nullptr;
         DcmPixelSequence* sequence = nullptr;
         pixels.getOriginalRepresentationKey(xfer, parameter);
         if (pixels.getEncapsulatedRepresentation(xfer, parameter, sequence).bad())
-            continue;
-        for (int frame = 0; frame < index.frames(); ++frame) {
-            const QByteArray expected = fragmentsByDcmtk(*sequence, frame, index.frames());
+            return;
+        for (int frame = 0; frame < real.index.frames(); ++frame) {
+            const QByteArray expected = fragmentsByDcmtk(*sequence, frame, real.index.frames());
             QByteArray stored;
-            ASSERT_TRUE(index.readStored(source, frame, stored).good()) << qPrintable(path);
-            EXPECT_TRUE(expected.isNull() || stored == expected) << qPrintable(path) << " frame " << frame;
+            ASSERT_TRUE(real.index.readStored(real.source, frame, stored).good());
+            EXPECT_TRUE(expected.isNull() || stored == expected) << "frame " << frame;
             compared += expected.isNull() ? 0 : 1;
         }
-    }
+    });
     EXPECT_GT(compared, 400);
 }
 
@@ -127,25 +106,23 @@ TEST_F(RealFrames, AreDecodedAsByDcmtk)
 {
     std::set<QByteArray> syntaxes;
     int files = 0;
-    for (const QString& path : mPaths) {
-        FrameIndex index;
-        ByteSource source = sourceOf(path, index);
-        DcmFileFormat file;
+    forEach([&](const QString& path, RealImage& real) {
+        FrameIndex& index = real.index;
         if (!index.isEncapsulated() || !index.canDecode() || index.decodedBits() % 8 != 0 ||
-            isDecodedOtherwise(path) || readDicomBuffer(source.bytes(), file).bad())
-            continue;
-        const QByteArray expected = decodedByDcmtk(*file.getDataset());
-        QByteArray decoded;
+            isDecodedOtherwise(path))
+            return;
+        const QByteArray expected = decodedByDcmtk(*real.file.getDataset());
+        if (expected.isNull())
+            return;
         const auto size = static_cast<int>(index.decodedBits() / 8);
-        for (int frame = 0; frame < index.frames() && !expected.isNull(); ++frame) {
-            ASSERT_TRUE(index.readDecoded(source, frame, decoded).good()) << qPrintable(path);
-            EXPECT_TRUE(decoded == expected.mid(frame * size, size))
-                << qPrintable(path) << " frame " << frame;
+        for (int frame = 0; frame < index.frames(); ++frame) {
+            QByteArray decoded;
+            ASSERT_TRUE(index.readDecoded(real.source, frame, decoded).good());
+            EXPECT_TRUE(decoded == expected.mid(frame * size, size)) << "frame " << frame;
         }
-        files += expected.isNull() ? 0 : 1;
-        if (!expected.isNull())
-            syntaxes.insert(index.transferSyntaxUID());
-    }
+        ++files;
+        syntaxes.insert(index.transferSyntaxUID());
+    });
     EXPECT_GT(files, 40);
     EXPECT_GE(syntaxes.size(), 7U);
 }
@@ -153,39 +130,34 @@ TEST_F(RealFrames, AreDecodedAsByDcmtk)
 TEST_F(RealFrames, AreThoseOfTheValueWhereNothingIsCompressed)
 {
     int compared = 0;
-    for (const QString& path : mPaths) {
-        FrameIndex index;
-        ByteSource source = sourceOf(path, index);
-        DcmFileFormat file;
+    forEach([&](const QString& /*path*/, RealImage& real) {
         DcmElement* element = nullptr;
-        const qint64 bits = index.decodedBits();
-        if (index.isEncapsulated() || !index.hasPixels() || bits == 0 ||
-            readDicomBuffer(source.bytes(), file).bad())
-            continue;
-        ASSERT_TRUE(file.getDataset()->findAndGetElement(index.pixelKey(), element).good())
-            << qPrintable(path);
+        const qint64 bits = real.index.decodedBits();
+        if (real.index.isEncapsulated() || !real.index.hasPixels() || bits == 0)
+            return;
+        ASSERT_TRUE(real.file.getDataset()->findAndGetElement(real.index.pixelKey(), element).good());
         QByteArray value(static_cast<int>(element->getLength()), 0);
         ASSERT_TRUE(element->getPartialValue(value.data(), 0, element->getLength()).good());
-        for (int frame = 0; frame < index.frames(); ++frame) {
+        const auto bitAt = [](const QByteArray& bytes, qint64 at) {
+            return (bytes.at(int(at / 8)) >> (at % 8)) & 1;
+        };
+        for (int frame = 0; frame < real.index.frames(); ++frame) {
             QByteArray stored;
-            ASSERT_TRUE(index.readStored(source, frame, stored).good()) << qPrintable(path);
+            ASSERT_TRUE(real.index.readStored(real.source, frame, stored).good());
             ASSERT_EQ(stored.size(), (bits + 7) / 8);
             bool isEqual = true;
-            for (qint64 bit = 0; bit < bits; ++bit) {
-                const qint64 at = frame * bits + bit;
-                isEqual = isEqual && ((stored.at(int(bit / 8)) >> (bit % 8)) & 1) ==
-                                         ((value.at(int(at / 8)) >> (at % 8)) & 1);
-            }
-            EXPECT_TRUE(isEqual) << qPrintable(path) << " frame " << frame;
+            for (qint64 bit = 0; bit < bits; ++bit)
+                isEqual = isEqual && bitAt(stored, bit) == bitAt(value, frame * bits + bit);
+            EXPECT_TRUE(isEqual) << "frame " << frame;
             ++compared;
         }
-    }
+    });
     EXPECT_GT(compared, 100);
 }
 
 TEST_F(RealFrames, AreFoundWithoutReadingThem)
 {
-    for (const QString& path : mPaths) {
+    for (const QString& path : realFiles("transfer-syntaxes") + realFiles("multiframe")) {
         FrameIndex index;
         ByteSource source = ByteSource::ofFile(path);
         const bool isLarge = index.read(source).good() && index.frames() == 1 && source.size() > 1000 * 1000;

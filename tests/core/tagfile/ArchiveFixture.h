@@ -195,10 +195,12 @@ protected:
         EXPECT_TRUE(job.outcome.notFound.isEmpty());
     }
 
-    static std::string refusal(QAData job)
+    /// Why a job is refused: because others hold a study, or because of what it asks for.
+    static std::string refusal(QAData job, ChangeFault fault = ChangeFault::Refused)
     {
         QString message;
         EXPECT_FALSE(TagFile::applyQA(job, message));
+        EXPECT_EQ(job.outcome.fault, fault) << message.toStdString();
         return message.toStdString();
     }
 

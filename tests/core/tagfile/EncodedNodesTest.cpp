@@ -1,8 +1,7 @@
 #include "TagFileFixture.h"
 #include "kddlib/tagmodel/TagSequence.h"
 #include "support/RandomImages.h"
-
-#include <thread>
+#include "support/Threads.h"
 
 using namespace Kdd;
 
@@ -159,11 +158,7 @@ TEST_F(EncodedNodes, AreDecodedOnceForSeveralThreads)
         TagFile file;
         ASSERT_TRUE(read(file, content));
         std::vector<std::string> texts(4);
-        std::vector<std::thread> threads;
-        for (std::string& text : texts)
-            threads.emplace_back([&] { text = imagesText(file); });
-        for (std::thread& thread : threads)
-            thread.join();
+        onThreads(4, [&](int thread) { texts[static_cast<std::size_t>(thread)] = imagesText(file); });
         EXPECT_EQ(texts, std::vector<std::string>(4, mShown));
     }
 }

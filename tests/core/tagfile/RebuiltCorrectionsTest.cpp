@@ -6,8 +6,7 @@
 #include "support/LogCapture.h"
 #include "support/PostgresServer.h"
 #include "support/Process.h"
-
-#include <thread>
+#include "support/Threads.h"
 
 namespace Kdd
 {
@@ -102,11 +101,13 @@ TEST_F(RebuiltCorrections, WhatCannotBeWrittenIsNotKeptEither)
     const std::string before = shown(mAll);
     {
         const FullDisk disk(2'000'000);
-        EXPECT_NE(refusal(edit({"a", "b"}, {{DCM_PatientName, QStringLiteral("Poe^P")}})), "");
+        EXPECT_NE(
+            refusal(edit({"a", "b"}, {{DCM_PatientName, QStringLiteral("Poe^P")}}), ChangeFault::Failed), "");
         EXPECT_NE(refusal(move({"a", "b"}, "1", "3", {{DCM_SOPInstanceUID, QStringLiteral("x")}})), "")
             << "two of one UID";
-        EXPECT_NE(refusal(move({"a", "b"}, "1", "3")), "") << "which leaves the large one";
-        EXPECT_NE(refusal(move({"large"}, "1", "2")), "") << "which brings it";
+        EXPECT_NE(refusal(move({"a", "b"}, "1", "3"), ChangeFault::Failed), "")
+            << "which leaves the large one";
+        EXPECT_NE(refusal(move({"large"}, "1", "2"), ChangeFault::Failed), "") << "which brings it";
     }
     EXPECT_EQ(shown(mAll), before);
     EXPECT_EQ(waiting(), 0);
@@ -120,10 +121,7 @@ TEST_F(RebuiltCorrections, OfAStudyThatOthersWorkOnAreRefused)
     const std::string before = shown(mAll);
     std::unique_ptr<Kxg::StudyClaim> claim;
     ASSERT_TRUE(mCatalogue->claim("2", 0, claim).good() && claim != nullptr);
-    QAData job = move({"a"}, "1", "2");
-    QString message;
-    EXPECT_FALSE(TagFile::applyQA(job, message));
-    EXPECT_EQ(job.outcome.fault, ChangeFault::LockedOut) << message.toStdString();
+    refusal(move({"a"}, "1", "2"), ChangeFault::LockedOut);
     EXPECT_EQ(shown(mAll), before);
 }
 
@@ -199,7 +197,8 @@ TEST_F(RebuiltCorrections, ADamagedRecordIsMadeAnewFromTheLogOrToldAndTheRestIsB
     const LogCapture log;
     correct(edit({"a", "b"}, kRoe));
     damageRecord("1", "a");
-    EXPECT_NE(refusal(edit({"a"}, kNext)).find("of image a is damaged"), std::string::npos);
+    EXPECT_NE(refusal(edit({"a"}, kNext), ChangeFault::Failed).find("of image a is damaged"),
+              std::string::npos);
     expectSurvival(mAll);
     correct(edit({"a"}, kNext));
     damageRecord("1", "a");
@@ -226,10 +225,7 @@ TEST_F(RebuiltCorrections, MovesInOppositeDirectionsAtOnceLoseNothing)
     // other one is.
     for (const QByteArray& database : {mAddress, QByteArray()}) {
         Kxg::SetDatabaseServer(database);
-        std::thread there(moveAll, "1", "2");
-        std::thread back(moveAll, "2", "1");
-        there.join();
-        back.join();
+        onThreads(2, [&](int thread) { thread == 0 ? moveAll("1", "2") : moveAll("2", "1"); });
         EXPECT_EQ(imagesIn("1").size() + imagesIn("2").size(), 4);
         if (!database.isEmpty())
             expectSurvival(mAll);
@@ -267,19 +263,21 @@ TEST_F(RebuiltCorrectionsOnServer, AreMadeByTheBuildWhenTheDatabaseIsLostAtTheir
     buildAll();
     const std::string before = shown({"1", "2"});
     loseAt("INSERT ON correction");
-    EXPECT_NE(refusal(edit({"a"}, kRoe)).find("could not be kept"), std::string::npos);
+    EXPECT_NE(refusal(edit({"a"}, kRoe), ChangeFault::Unasked).find("could not be kept"), std::string::npos);
     EXPECT_EQ(waiting(), 0);
     loseNoMore();
     auto disk = std::make_unique<FullDisk>(2'000'000);
     loseAt("DELETE ON correction");
-    EXPECT_NE(refusal(edit({"a"}, kRoe)).find("keeps the correction ("), std::string::npos);
+    EXPECT_NE(refusal(edit({"a"}, kRoe), ChangeFault::Kept).find("keeps the correction ("),
+              std::string::npos);
     loseNoMore();
     EXPECT_EQ(shown({"1", "2"}), before);
     disk.reset();
     buildAll();
     EXPECT_EQ(value("1", "a", DCM_PatientName), "Roe^R");
     disk = std::make_unique<FullDisk>(2'000'000);
-    EXPECT_NE(refusal(move({"b"}, "1", "2")).find("keeps the correction, and"), std::string::npos)
+    EXPECT_NE(refusal(move({"b"}, "1", "2"), ChangeFault::Kept).find("keeps the correction, and"),
+              std::string::npos)
         << "it cannot be taken back: files of the image that is replaced would go along";
     disk.reset();
     buildAll();

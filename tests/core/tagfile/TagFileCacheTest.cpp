@@ -76,28 +76,6 @@ TEST_F(TagFileCache, WhatIsWrittenIsFoundByTheDigestOfItsUid)
     EXPECT_EQ(file.cacheFilePath(), path());
 }
 
-TEST_F(TagFileCache, AStampedReadKnowsTheStateThatWasWritten)
-{
-    const LogCapture log;
-    TagFile file;
-    EXPECT_FALSE(file.readStampedWhenFree(path(), kStudy));
-    EXPECT_TRUE(file.stamp() == Kxg::TagFileStamp());
-    ASSERT_TRUE(put(1, 9, write));
-    const int longest = content().size();
-    ASSERT_TRUE(file.readCacheFileForStudy(kStudy, true));
-    const char* gone[] = {"1", "2", "3"};
-    file.removeImages(3, gone);
-    ASSERT_TRUE(file.writeCacheFile());
-    EXPECT_EQ(content().size(), longest) << "bytes of the former content follow";
-    TagFile again;
-    ASSERT_TRUE(again.readStampedWhenFree(path(), kStudy));
-    EXPECT_TRUE(again.stamp() == file.stamp());
-    EXPECT_FALSE(again.stamp().digest.isEmpty());
-    ASSERT_TRUE(put(10, 10, merge));
-    ASSERT_TRUE(again.readStampedWhenFree(path(), kStudy));
-    EXPECT_FALSE(again.stamp() == file.stamp());
-}
-
 TEST_F(TagFileCache, SaysWhatCannotBeReadOrWritten)
 {
     const LogCapture log;
@@ -165,11 +143,14 @@ TEST_F(TagFileCache, WhoServesWaitsLongerThanOneWhoReads)
     qunsetenv("KDD_READ_PATIENCE");
 }
 
-TEST_F(TagFileCache, AShorterStudyInAFileKeptOpenLeavesTheOldEnd)
+TEST_F(TagFileCache, AShorterStudyInAFileKeptOpenLeavesTheOldEndWhichNoStampCounts)
 {
+    const LogCapture log;
+    TagFile file;
+    EXPECT_FALSE(file.readStampedWhenFree(path(), kStudy));
+    EXPECT_TRUE(file.stamp() == Kxg::TagFileStamp());
     ASSERT_TRUE(put(1, 9, write));
     const QByteArray before = content();
-    TagFile file;
     ASSERT_TRUE(file.readCacheFileForStudy(kStudy, true));
     for (const char* uid : {"2", "3", "4", "5", "6", "7", "8", "9"})
         file.removeImages(1, &uid);
@@ -177,22 +158,32 @@ TEST_F(TagFileCache, AShorterStudyInAFileKeptOpenLeavesTheOldEnd)
     EXPECT_EQ(content().right(100), before.right(100));
     EXPECT_EQ(content().size(), before.size());
     EXPECT_EQ(imagesFound(), 1);
+    TagFile again;
+    ASSERT_TRUE(again.readStampedWhenFree(path(), kStudy));
+    EXPECT_TRUE(again.stamp() == file.stamp());
+    EXPECT_FALSE(again.stamp().digest.isEmpty());
     ASSERT_TRUE(file.writeCacheFile()) << "not open any more, so made anew";
     EXPECT_LT(content().size(), before.size());
     EXPECT_EQ(imagesFound(), 1);
+    ASSERT_TRUE(put(10, 10, merge));
+    ASSERT_TRUE(again.readStampedWhenFree(path(), kStudy));
+    EXPECT_FALSE(again.stamp() == file.stamp());
 }
 
-TEST_F(TagFileCache, AnEmptyOneDeletesTheFileKeptOpen)
+TEST_F(TagFileCache, AnEmptyOneDeletesTheFileKeptOpenAndNoCopyWrittenElsewhere)
 {
     ASSERT_TRUE(put(1, 2, write));
+    const QString elsewhere = mStore.filePath("elsewhere.tc");
     TagFile file;
     EXPECT_FALSE(file.writeCacheFile()) << "nothing is open";
     ASSERT_TRUE(file.readCacheFileForStudy(kStudy, true));
+    ASSERT_TRUE(file.writeCacheFile(elsewhere.toLocal8Bit().constData()));
     // What a write leaves that the device refused halfway would bring the study back.
     put(journal(), journalOf(content()));
     file.clear();
     EXPECT_TRUE(file.writeCacheFile());
     EXPECT_FALSE(QFile::exists(path()));
+    EXPECT_TRUE(QFile::exists(elsewhere));
     EXPECT_TRUE(put(3, 3, merge)) << "nobody is locked out";
     EXPECT_EQ(imagesFound(), 1);
 }
@@ -281,18 +272,6 @@ TEST_F(TagFileCache, TheBytesOfAFolderNameSurvive)
     EXPECT_TRUE(put(1, 1, write) && put(2, 2, merge));
     EXPECT_EQ(imagesFound(), 2);
     EXPECT_GT(std::filesystem::remove_all(folder), 0U);
-}
-
-TEST_F(TagFileCache, ACopyWrittenElsewhereLeavesTheFileHeldOpenTheStudysOwn)
-{
-    TagFile file;
-    ASSERT_TRUE(put(1, 2, write) && file.readCacheFileForStudy(kStudy, true));
-    const QString elsewhere = mStore.filePath("elsewhere.tc");
-    ASSERT_TRUE(file.writeCacheFile(elsewhere.toLocal8Bit().constData()));
-    file.clear();
-    EXPECT_TRUE(file.writeCacheFile()) << "of nothing, which removes the file held open";
-    EXPECT_FALSE(QFile::exists(path()));
-    EXPECT_TRUE(QFile::exists(elsewhere));
 }
 
 TEST_F(TagFileCache, OneMadeInVainGoesUnlessAJournalIsItsContent)

@@ -94,6 +94,24 @@ protected:
         file.addVolumeInfo(pointers);
     }
 
+    /// A study with something of everything that a record can hold.
+    static void fill(TagFile& file)
+    {
+        for (const char* uid : {"1", "2", "3"}) {
+            const DatasetBuilder item = anItem().with(DCM_CodeValue, uid);
+            DatasetBuilder image = anImage(uid).with(DCM_PatientName, "Doe^J").with(DCM_Rows, "512");
+            image.inSeries(*uid == '3' ? "1.2.4" : "1.2.3");
+            image.withItem(DCM_RequestAttributesSequence, anItem().withItem(DCM_ReferencedSOPSequence, item));
+            if (*uid != '2')
+                image.withLong(DCM_TextValue, 2000).with(DCM_PatientComments, "not in all");
+            add(file, image)->putAndInsertValue(kPreview, VrCode::OB, QByteArray(uid) + "jpeg");
+        }
+        auto* volume = new Volume;
+        volume->setPreviewData("the volume's jpeg");
+        file.findSeries("1.2.3")->addBareVolume(volume);
+        file.optimizeAll();
+    }
+
     /// The file of the study that images belong to by default.
     static QString path() { return TagFile::cacheFilePathForStudy("1.2"); }
     static QString journal() { return path() + QStringLiteral(".journal"); }

@@ -35,24 +35,6 @@ protected:
         EXPECT_TRUE(preview == nullptr || preview->vr() == VrCode::OB);
         return preview != nullptr ? preview->value() : QByteArray("none");
     }
-
-    /// A study with something of everything that a record can hold.
-    static void fill(TagFile& file)
-    {
-        for (const char* uid : {"1", "2", "3"}) {
-            const DatasetBuilder item = anItem().with(DCM_CodeValue, uid);
-            DatasetBuilder image = anImage(uid).with(DCM_PatientName, "Doe^J").with(DCM_Rows, "512");
-            image.inSeries(*uid == '3' ? "1.2.4" : "1.2.3");
-            image.withItem(DCM_RequestAttributesSequence, anItem().withItem(DCM_ReferencedSOPSequence, item));
-            if (*uid != '2')
-                image.withLong(DCM_TextValue, 2000).with(DCM_PatientComments, "not in all");
-            add(file, image)->putAndInsertValue(kPreview, VrCode::OB, QByteArray(uid) + "jpeg");
-        }
-        auto* volume = new Volume;
-        volume->setPreviewData("the volume's jpeg");
-        file.findSeries("1.2.3")->addBareVolume(volume);
-        file.optimizeAll();
-    }
 };
 
 TEST_F(TagFileFormat, IsFixedToTheByte)
@@ -98,8 +80,7 @@ TEST_F(TagFileFormat, TheOldLayoutRunsToTheEndAndHasNoPreviews)
     TagFile file;
     TagMap* image = add(file, anImage("1"));
     image->putAndInsertValue(kPreview, VrCode::OB, "jpeg");
-    image->putAndInsertValue(DCM_PixelData, VrCode::OB,
-                             QByteArray(600000, 'x'));  // several pieces of reading
+    image->putAndInsertValue(DCM_PixelData, VrCode::OB, QByteArray(600000, 'x'));  // read in several pieces
     TagFile again;
     ASSERT_TRUE(read(again, QByteArray("TaCa\0\0\1\0", 8) + bodyOf(file)));
     EXPECT_EQ(previewOf(again, "1"), "none");

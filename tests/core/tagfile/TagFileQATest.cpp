@@ -310,11 +310,8 @@ TEST_F(TagFileQA, AMoveThatEndedBetweenTheTwoWritesKeepsWhatWasEditedMeanwhile)
                                "31/1/2024 12:00:00 PM anna\n0010-0010\nDoe^J\nMeanwhile\n\n");
     TagFile holder;
     ASSERT_TRUE(holder.readCacheFileForStudy("9", true));
-    QAData job = move({"3"}, "1", "9");
-    QString message;
-    EXPECT_FALSE(TagFile::applyQA(job, message));
-    EXPECT_EQ(job.outcome.fault, ChangeFault::LockedOut);
-    EXPECT_EQ(message, QStringLiteral("The tag file of study 9 cannot be changed: others hold it"));
+    EXPECT_EQ(refusal(move({"3"}, "1", "9"), ChangeFault::LockedOut),
+              "The tag file of study 9 cannot be changed: others hold it");
 }
 
 }  // namespace

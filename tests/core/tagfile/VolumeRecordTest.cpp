@@ -12,14 +12,10 @@
 #include <random>
 #include <set>
 
+using namespace Kdd;
+
 namespace
 {
-
-using Kdd::kVolumeIndex;
-using Kdd::KxMsg;
-using Kdd::Slice;
-using Kdd::TagMap;
-using Kdd::Volume;
 
 using Blobs = QList<QByteArray>;
 
@@ -43,7 +39,7 @@ struct Series
         image->putAndInsertString(DCM_SOPInstanceUID, QByteArray::number(number));
         image->putAndInsertInt(DCM_InstanceNumber, number);
         image->putAndInsertInt(DCM_PixelRepresentation, isSigned ? 1 : 0);
-        image->putAndInsertValue(kVolumeIndex, Kdd::VrCode::OB, volumeIndexes);
+        image->putAndInsertValue(kVolumeIndex, VrCode::OB, volumeIndexes);
         node.addChildMap(image, TagMap::ImageLevel);
     }
 
@@ -89,8 +85,8 @@ struct Series
 QByteArray describe(const Volume& v)
 {
     KxMsg out;
-    Kdd::Box3f box;
-    Kdd::Mat4f matrix;
+    Box3f box;
+    Mat4f matrix;
     v.getBoundingBox(box);
     v.getTransformationMatrix(matrix);
     out << v.volumeIndex() << v.dims() << box << matrix << v.slices().size();
@@ -99,7 +95,7 @@ QByteArray describe(const Volume& v)
     out.write(v.volumeFileName() + '|' + v.previewData() + '|' + v.fileNameSuffix());
     if (v.fileNameSuffix().isEmpty())
         return out.bytes();
-    const Kdd::KxHistogram& histogram = v.histogram();
+    const KxHistogram& histogram = v.histogram();
     out << v.rescaleSlope() << v.rescaleIntercept() << v.precisionBitLoss() << v.numLossyCompressedImages()
         << v.numOverlayPlanes() << v.paddingValue().value_or(-1) << v.paddingRangeLimit().value_or(-1)
         << float(histogram.minimum()) << float(histogram.maximum());
@@ -150,7 +146,7 @@ struct RandomVolumes
             slices[i] = slice(i, count - 1 - i, shape, widest);
         made.setSlices(slices);
         made.setImages(QVector<TagMap*>(once(3) ? below(12) : count, image), nullptr);
-        Kdd::Mat4f matrix;
+        Mat4f matrix;
         matrix.m[5] = real();
         made.setGeometry({once(6) ? 0 : 1 + below(512), below(512), once(5) ? below(12) : count},
                          {real(), real(), real(), real(), real(), real()}, matrix);
@@ -162,7 +158,7 @@ struct RandomVolumes
         made.setNumOverlayPlanes(below(256));
         made.setPadding(padding(), padding());
         const QVector<quint64> bins = {quint64(below(100000000)), quint64(below(100000000))};
-        made.setHistogram(Kdd::KxHistogram(bins.mid(below(3)), below(65536), below(65536)));
+        made.setHistogram(KxHistogram(bins.mid(below(3)), below(65536), below(65536)));
         return made;
     }
 
@@ -206,7 +202,7 @@ TEST(VolumeRecord, WhatTheSliceCountsClaimIsHeldAgainstWhatIsThere)
     const QByteArray before = describe(volume);
     for (const QVector<qint32>& row : rows) {  // slices, code, list
         KxMsg in;
-        in << Kdd::Vec3i{1, 1, row[0]} << Kdd::Box3f() << Kdd::Mat4f() << quint16(0) << quint8(row[1]);
+        in << Vec3i{1, 1, row[0]} << Box3f() << Mat4f() << quint16(0) << quint8(row[1]);
         for (const qint32 value : row.mid(2))
             in << value;
         in << quint16(0);
@@ -225,9 +221,9 @@ TEST(VolumeList, NamesNoMoreImagesThanItsReaderTakes)
         indexes.append(char(i));
     for (const int tooMany : {0, 1}) {
         Series series;
-        for (int i = 0; i < Kdd::kMaxVolumeImages / 256 + tooMany; ++i)
+        for (int i = 0; i < kMaxVolumeImages / 256 + tooMany; ++i)
             series.node.addChildMap(new TagMap, TagMap::ItemLevel);
-        series.node.putAndInsertValue(kVolumeIndex, Kdd::VrCode::OB, indexes);
+        series.node.putAndInsertValue(kVolumeIndex, VrCode::OB, indexes);
         series.addStack();
         EXPECT_EQ(series.written().isEmpty(), tooMany == 1);
         EXPECT_EQ(series.read(empty.written()), tooMany == 0);
@@ -291,7 +287,7 @@ TEST(VolumeRecord, ExtraDataHasAFixedLayout)
     volume.setRescale(1, -2, 0.5F);
     volume.setNumLossyCompressedImages(0x0102);
     volume.setPadding(-2, boost::none);
-    volume.setHistogram(Kdd::KxHistogram({1, 0x01020304}, 0.5, 254.4));
+    volume.setHistogram(KxHistogram({1, 0x01020304}, 0.5, 254.4));
     volume.setNumOverlayPlanes(9);
     EXPECT_EQ(body(volume).mid(kBeforeCode + 3).toHex(), "00"          // version
                                                          "0300735f32"  // suffix

@@ -3,11 +3,11 @@
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/tagmodel/TagSequence.h"
 #include "support/DatasetBuilder.h"
+#include "support/FileContent.h"
 #include "support/LogCapture.h"
 #include "support/RealFiles.h"
 
 #include <QFile>
-#include <QTemporaryDir>
 
 #include <dcmtk/dcmdata/dcpixel.h>
 #include <dcmtk/dcmdata/dcpixseq.h>
@@ -126,16 +126,16 @@ std::string contentOf(DcmItem& item, const std::string& indent = {})
     return text;
 }
 
-class DatasetRoundTrip : public testing::Test
+class DatasetRoundTrip : public FileTest
 {
 protected:
     void SetUp() override { OFLog::configure(OFLogger::OFF_LOG_LEVEL); }
 
     void store(DcmDataset& dataset, E_TransferSyntax xfer, DcmFileFormat& read)
     {
-        const OFCondition written = DcmFileFormat(&dataset).saveFile(path().constData(), xfer);
+        const OFCondition written = DcmFileFormat(&dataset).saveFile(path().toLocal8Bit().constData(), xfer);
         EXPECT_TRUE(written.good()) << written.text();
-        EXPECT_TRUE(read.loadFile(path().constData()).good());
+        EXPECT_TRUE(read.loadFile(path().toLocal8Bit().constData()).good());
     }
 
     /// Whether a file of the dataset is the same after it has gone through the cache.
@@ -165,11 +165,6 @@ protected:
                 expectKept(image.dataset(), xfer);
         }
     }
-
-    QByteArray path() const { return mFolder.filePath(QStringLiteral("file")).toLocal8Bit(); }
-
-private:
-    QTemporaryDir mFolder;
 };
 
 TEST_F(DatasetRoundTrip, KeepsEveryByteOfEveryAttributeAndRepresentation)
@@ -223,7 +218,7 @@ TEST_F(DatasetRoundTrip, TakesAValueThatCannotBeReadAnyMoreForOmitted)
 {
     DcmFileFormat file;
     store(anImage().withLong(DCM_TextValue, 5000).dataset(), EXS_LittleEndianExplicit, file);
-    ASSERT_TRUE(QFile::remove(QString::fromLocal8Bit(path())));
+    ASSERT_TRUE(QFile::remove(path()));
     const LogCapture log;
     const std::unique_ptr<TagMap> map(TagMap::createTagMap(file.getDataset(), 10000));
     EXPECT_TRUE(map->findElement(DCM_TextValue)->markedAsOmitted());

@@ -146,10 +146,10 @@ TEST_F(StackWriter, KeepsThePhysicalValuesOfRealSeries)
     for (const auto& [folder, error] : folders) {
         const StackSeries series(realFiles(folder));
         for (const StackPlan& plan : series.plans()) {
-            for (const Stack& stack : plan.stacks)
+            for (const Stack& stack : plan.stacks) {
                 EXPECT_LE(worstError(stack), error) << folder;
-            for (const Stack& stack : plan.stacks)
                 EXPECT_LT(farthestOff(stack), 0.02) << folder;
+            }
         }
     }
 }

@@ -7,11 +7,11 @@
 
 #include <memory>
 
+using namespace Kdd;
+
 namespace
 {
 
-using Kdd::TagMap;
-using Kdd::Volume;
 using UIDs = std::vector<std::string>;
 
 class OpenVolume : public Volume

@@ -53,7 +53,7 @@ protected:
         std::shared_ptr<const ServedStudy> study;
         const Presence presence = shelf.find(uid, study);
         EXPECT_EQ(presence == Presence::Found, study != nullptr);
-        const char* const words[] = {"found", "absent", "held", "damaged"};
+        const char* const words[] = {"found", "absent", "unbuilt", "held", "damaged"};
         return study != nullptr ? nameIn(*study) : QByteArray(words[static_cast<int>(presence)]);
     }
 

@@ -87,14 +87,14 @@ TEST_F(Download, GivesEveryByteUntilTheEndWithAnyNumberOfRanges)
     }
 }
 
-struct LaterFault
+struct AnswerFault
 {
     const char* name;
     void (*spoil)(ObjectServer::Answer&);
     const char* reason;
 };
 
-const LaterFault kLaterFaults[] = {
+const AnswerFault kLaterFaults[] = {
     {"OtherEntityTag", [](auto& a) { a.entityTag = "\"v2\""; }, "has changed"},
     {"OtherTotal", [](auto& a) { a.total = "20001"; }, "has changed"},
     {"UnknownTotal", [](auto& a) { a.total = "*"; }, "has changed"},
@@ -113,7 +113,7 @@ TEST_F(Download, FailsWithALaterRangeWithoutAByteThatIsNotTheObjects)
 {
     constexpr int kFaultyAt = 6000;
     const QByteArray object = someObject(20'000);
-    for (const LaterFault& fault : kLaterFaults) {
+    for (const AnswerFault& fault : kLaterFaults) {
         SCOPED_TRACE(fault.name);
         const ObjectServer server(object, [&](ObjectServer::Answer& answer) {
             if (answer.first == kFaultyAt)
@@ -130,14 +130,8 @@ TEST_F(Download, FailsWithALaterRangeWithoutAByteThatIsNotTheObjects)
     }
 }
 
-struct FirstAnswer
-{
-    const char* name;
-    void (*change)(ObjectServer::Answer&);
-    const char* reasonMidway;
-};
-
-const FirstAnswer kWithoutRanges[] = {
+/// The last is the reason where the reading began midway.
+const AnswerFault kWithoutRanges[] = {
     {"UnknownTotal", [](auto& a) { a.total = "*"; }, "does not say how long"},
     {"NothingInRange", [](auto& a) { a.code = 416; }, ""},
 };
@@ -145,9 +139,9 @@ const FirstAnswer kWithoutRanges[] = {
 TEST_F(Download, AsksForTheWholeWhereNoRangesCanBePlannedUnlessItBeganMidway)
 {
     const QByteArray object = someObject(20'000);
-    for (const FirstAnswer& answer : kWithoutRanges) {
+    for (const AnswerFault& answer : kWithoutRanges) {
         SCOPED_TRACE(answer.name);
-        const ObjectServer server(object, answer.change);
+        const ObjectServer server(object, answer.spoil);
         fetchInRanges(3, 2000);
         KxCurlDownloadStream whole = client.read(server.url(), true);
         EXPECT_EQ(readAll(whole), object);
@@ -156,7 +150,7 @@ TEST_F(Download, AsksForTheWholeWhereNoRangesCanBePlannedUnlessItBeganMidway)
         KxCurlDownloadStream rest = client.readFrom(server.url(), 5000);
         readAll(rest);
         EXPECT_FALSE(rest.httpStatus().ok());
-        EXPECT_THAT(rest.failure(), HasSubstr(answer.reasonMidway));
+        EXPECT_THAT(rest.failure(), HasSubstr(answer.reason));
     }
 }
 

@@ -1,8 +1,12 @@
 #include "TagFileFixture.h"
 #include "kddlib/tagfile/qa/QAData.h"
 #include "platform/database/DirectoryEntry.h"
+#include "support/RandomImages.h"
 
-#include <random>
+#include <algorithm>
+#include <map>
+#include <set>
+#include <sstream>
 
 namespace Kdd
 {
@@ -10,11 +14,19 @@ namespace
 {
 
 constexpr int kImages = 14;
-constexpr int kSteps = 30;
-constexpr unsigned kSeeds = 80;
+constexpr int kSteps = 40;
+constexpr unsigned kSeeds = 100;
 
-/// All that happens to images of volumes, at random, beside a model that knows for each slice of each volume its image.
-class VolumeOperations : public TagFileTest
+/// What an image without UID is known by, its path.
+constexpr const char* kNameless = "/a/b";
+
+/// What operations change in an image that they are not about: its places, marks of others, and what a correction notes.
+constexpr const char* kNotItsOwn[] = {"0006,7100", "0006,7101", "0006,7103", "0006,7107",
+                                      "0006,7108", "0006,7120", "0020,0013", "0071,"};
+
+/// All that happens to images, at random, beside a model that knows what each showed when it stood alone, and for each
+/// slice of each volume its image.
+class StudyOperations : public TagFileTest
 {
 protected:
     struct Stack
@@ -23,22 +35,39 @@ protected:
         std::vector<std::pair<QByteArray, int>> slices;  // image, empty when it is lost, and frame
     };
 
-    int any(int count) { return static_cast<int>(mRandom() % static_cast<unsigned>(count)); }
+    int any(int count) { return mRandom.below(count); }
     QByteArray anyUID() { return QByteArray::number(1 + any(kImages)); }
     QByteArray anySeries() { return "1.2." + QByteArray::number(any(3)); }
 
+    static std::string shownOf(const TagMap& image)
+    {
+        std::string text;
+        std::istringstream lines(shownText(image));
+        for (std::string line; std::getline(lines, line);) {
+            const bool isOwn = std::none_of(std::begin(kNotItsOwn), std::end(kNotItsOwn),
+                                            [&](const char* key) { return line.find(key) == 0; });
+            text += isOwn ? line + '\n' : "";
+        }
+        return text;
+    }
+
     TagMap* newImage(const QByteArray& uid, const QByteArray& series)
     {
-        return anImage(uid).inSeries(series).with(DCM_InstanceNumber, QByteArray::number(any(9))).map();
+        TagMap* image = mRandom.next(uid);
+        image->putAndInsertString(DCM_SeriesInstanceUID, series);
+        image->putAndInsertString(DCM_InstanceNumber, QByteArray::number(any(9)));
+        mShown[uid] = shownOf(*image);
+        return image;
     }
 
     /// Also one without UID, which is known by its path.
     void build(unsigned seed)
     {
-        mRandom.seed(seed);
+        mRandom = RandomImages(seed);
         mFile.clear();
         mSeries.clear();
         mStacks.clear();
+        mShown.clear();
         for (int i = 1; i <= kImages; ++i)
             place(mFile, QByteArray::number(i), anySeries());
         mFile.addTagMap(anImage().inSeries("1.2.0").without(DCM_SOPInstanceUID).map(), "/a\\b", false);
@@ -109,6 +138,7 @@ protected:
     {
         lose(uid);
         mSeries.erase(uid);
+        mShown.erase(uid);
     }
 
     void step()
@@ -116,26 +146,84 @@ protected:
         const QByteArray uid = anyUID();
         const bool isHeld = mSeries.count(uid) != 0;
         const char* uids[] = {uid.constData()};
-        switch (any(8)) {
+        switch (any(12)) {
         case 0:
             EXPECT_EQ(mFile.removeImages(1, uids), isHeld ? 1 : 0);
             return remove(uid);
         case 1:
-            EXPECT_EQ(std::unique_ptr<TagMap>(mFile.takeImage(uid)) != nullptr, isHeld);
-            return remove(uid);
+            return take(uid);
         case 2:
-            return place(mFile, uid, isHeld && any(2) == 0 ? mSeries[uid] : anySeries());
         case 3:
-            return mFile.optimizeAll();
+            return place(mFile, uid, isHeld && any(2) == 0 ? mSeries[uid] : anySeries());
         case 4:
-            return sync();
+            return mFile.optimizeAll();
         case 5:
-            return merge();
+            return sync();
         case 6:
+            return merge();
+        case 7:
             return correct();
+        case 8:
+            return emptySeries();
+        case 9:
+            return rearrange();
+        case 10:
+            return writeAndRead();
         default:
             return addVolume();
         }
+    }
+
+    /// Takes an image out, perhaps to put it back.
+    void take(const QByteArray& uid)
+    {
+        std::unique_ptr<TagMap> taken(mFile.takeImage(uid));
+        ASSERT_EQ(taken != nullptr, mSeries.count(uid) != 0);
+        if (taken == nullptr)
+            return;
+        EXPECT_EQ(shownOf(*taken), mShown[uid]);
+        if (any(2) == 0)
+            return remove(uid);
+        lose(uid);
+        ASSERT_NE(mFile.addTagMap(taken.release(), nullptr, false), nullptr);
+    }
+
+    /// Leaves a series without images in the tree, to be filled again.
+    void emptySeries()
+    {
+        const QByteArray series = anySeries();
+        for (const auto& each : std::map<QByteArray, QByteArray>(mSeries)) {
+            if (each.second != series)
+                continue;
+            delete mFile.takeImage(each.first);
+            remove(each.first);
+        }
+    }
+
+    /// What is shared among images is placed otherwise.
+    void rearrange()
+    {
+        for (int i = any(5); i >= 0 && !mFile.isEmpty(); --i) {
+            const QList<TagMap*> series = mFile.seriesByUID().values();
+            const int chosen = any(series.size() + 1);
+            TagMap& node = chosen < series.size() ? *series.at(chosen) : *mFile.study();
+            any(2) == 0 ? node.optimize(mRandom.key()) : node.storeOptionA(mRandom.key());
+            if (any(4) == 0)
+                node.optimizeAll();
+            if (any(4) == 0)
+                node.detachItems();
+            if (any(4) == 0)
+                mFile.study()->relinkItems();
+        }
+    }
+
+    void writeAndRead()
+    {
+        if (mSeries.empty())
+            return;
+        const QByteArray bytes = written(mFile);
+        ASSERT_TRUE(read(mFile, bytes, "1.2"));
+        EXPECT_EQ(written(mFile), bytes);
     }
 
     void addVolume()
@@ -183,6 +271,7 @@ protected:
                 place(arrivals, uid, stays ? mSeries[uid] : anySeries());
         }
         ASSERT_TRUE(arrivals.mergeIntoCacheFile());
+        EXPECT_EQ(found(arrivals), expected());
         ASSERT_TRUE(mFile.readCacheFileForStudy("1.2", false));
     }
 
@@ -218,6 +307,8 @@ protected:
             if (isSeen)
                 text += lineOf(stack.series, suffix) + line + '\n';
         }
+        for (const auto& [uid, shown] : mShown)
+            text += "image " + uid + '\n' + QByteArray::fromStdString(shown);
         return text.toStdString();
     }
 
@@ -243,17 +334,22 @@ protected:
         QByteArray text;
         for (const auto& each : lines)
             text += each.second;
+        for (auto it = file.imagesByUID().cbegin(); it != file.imagesByUID().cend(); ++it) {
+            if (it.key() != kNameless)
+                text += "image " + it.key() + '\n' + QByteArray::fromStdString(shownOf(*it.value()));
+        }
         return text.toStdString();
     }
 
-    std::mt19937 mRandom;
+    RandomImages mRandom{0};
     int mNumber = 10;  // of the last volume
     TagFile mFile;
     std::map<QByteArray, QByteArray> mSeries;  // by image
     std::map<QByteArray, Stack> mStacks;       // by suffix
+    std::map<QByteArray, std::string> mShown;  // by image
 };
 
-TEST_F(VolumeOperations, KeepTheImageOfEverySliceThatIsThere)
+TEST_F(StudyOperations, KeepWhatEveryImageShowsAndTheImageOfEverySliceThatIsThere)
 {
     const LogCapture log;
     for (unsigned seed = 0; seed < kSeeds && !HasFailure(); ++seed) {
