@@ -14,6 +14,7 @@
 #include <charconv>
 #include <cmath>
 #include <cstring>
+#include <limits>
 #include <sstream>
 
 namespace Kdd
@@ -181,29 +182,30 @@ bool plainNumbers(QByteArray& out, const DcmTagKey& key, const char* vr, const Q
     return true;
 }
 
-/// With as many digits as DCMTK gives; what is no number has no short way.
-bool plainDoubles(QByteArray& out, const DcmTagKey& key, const QByteArray& bytes)
+/// With as many digits as DCMTK gives. JSON has no number for what is not finite, so that is a string which programs take for
+/// one. Bytes behind the last whole value are no value.
+template <typename Real>
+bool plainReals(QByteArray& out, const DcmTagKey& key, const char* vr, const QByteArray& bytes)
 {
-    constexpr int kSize = sizeof(double);
-    constexpr int kDigits = 17;
-    if (bytes.size() % kSize != 0)
-        return false;
-    const int begin = out.size();
-    appendOpening(out, key, "FD");
-    for (int at = 0; at < bytes.size(); at += kSize) {
-        double value = 0;
+    constexpr int kSize = sizeof(Real);
+    constexpr int kDigits = std::numeric_limits<Real>::max_digits10;
+    appendOpening(out, key, vr);
+    const int end = bytes.size() - bytes.size() % kSize;
+    for (int at = 0; at < end; at += kSize) {
+        Real value = 0;
         std::memcpy(&value, bytes.constData() + at, kSize);
+        out.append(at == 0 ? R"(,"Value":[)" : ",");
         if (!std::isfinite(value)) {
-            out.truncate(begin);
-            return false;
+            out.append(std::isnan(value) ? R"("NaN")" : value > 0 ? R"("Infinity")" : R"("-Infinity")");
+            continue;
         }
         char digits[64];
-        OFStandard::ftoa(digits, sizeof digits, value, 0, 0, kDigits);
+        OFStandard::ftoa(digits, sizeof digits, static_cast<double>(value), 0, 0, kDigits);
         OFString number(digits);
         DcmJsonFormat::normalizeDecimalString(number);
-        out.append(at == 0 ? R"(,"Value":[)" : ",").append(number.c_str());
+        out.append(number.c_str());
     }
-    out.append(bytes.isEmpty() ? "}" : "]}");
+    out.append(end == 0 ? "}" : "]}");
     return true;
 }
 
@@ -231,7 +233,9 @@ bool JsonForm::plainValue(QByteArray& out, const DcmTagKey& key, VrCode vr, cons
 {
     switch (vr) {
     case VrCode::FD:
-        return plainDoubles(out, key, bytes);
+        return plainReals<double>(out, key, "FD", bytes);
+    case VrCode::FL:
+        return plainReals<float>(out, key, "FL", bytes);
     case VrCode::UN:
         return plainUnknown(out, key, bytes);
     case VrCode::SL:
