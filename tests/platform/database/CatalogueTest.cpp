@@ -66,8 +66,7 @@ protected:
     }
 };
 
-INSTANTIATE_TEST_SUITE_P(Engines, CatalogueTest, testing::Values(Engine::Sqlite, Engine::Postgres),
-                         engineName);
+INSTANTIATE_TEST_SUITE_P(Engines, CatalogueTest, kBothEngines, engineName);
 
 using Paths = std::vector<std::string>;
 using PathSet = std::set<std::string>;
@@ -98,7 +97,7 @@ TEST_P(CatalogueTest, UnknownFilesAreThoseThatWereNeverThere)
     QSet<QByteArray> paths{"/d/new", "/d/n%"};
     for (int i = 0; i < 450; ++i) {
         const QByteArray path = "/d/" + QByteArray::number(i);
-        files.push_back(dicom(path.constData(), "1", "1.1", path.constData()));
+        files.push_back(dicom(path, "1", "1.1", path));
         paths.insert(path);
     }
     add(files);
@@ -238,12 +237,11 @@ TEST_P(CatalogueTest, FilesOfAnImageAreFoundByWhatTheySayThemselves)
     const auto files = [&](const char* image) {
         QVector<KeptFile> found;
         EXPECT_TRUE(catalogue().imageFiles("1", image, found).good());
-        std::string text;
+        QByteArray text;
         for (const KeptFile& file : found)
-            text += (file.path + (file.isShown ? " shown " : " ") + file.shownStudyUID + ' ' +
-                     file.shownSeriesUID + ' ' + file.shownImage + '\n')
-                        .toStdString();
-        return text;
+            text += file.path + (file.isShown ? " shown " : " ") + file.shownStudyUID + ' ' +
+                    file.shownSeriesUID + ' ' + file.shownImage + '\n';
+        return text.toStdString();
     };
     EXPECT_EQ(files("x"), "/d/c shown 1 1.1 x\n/d/a 1 1.1 x\n");
     correct({{"1", "x", "2", "2.1", "x2", "changes"}, {"1", "y", "1", "1.1", "x", "changes"}});
