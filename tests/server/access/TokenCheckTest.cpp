@@ -75,12 +75,7 @@ TEST_F(TokenCheckTest, TakesWhatTheIssuerSigned)
 
 TEST_F(TokenCheckTest, GivesWhatTheClaimsSay)
 {
-    const struct
-    {
-        const char* name;
-        QJsonValue value;
-        const char* verdict;
-    } kClaims[] = {
+    const std::tuple<const char*, QJsonValue, const char*> kClaims[] = {
         {"scope", QStringLiteral("images.reader"), "anna 0"},
         {"scope", QStringLiteral("images.*"), "anna 0"},
         {"scope", QJsonArray{QStringLiteral("x"), QStringLiteral("images.read")}, "anna 1"},
@@ -90,9 +85,8 @@ TEST_F(TokenCheckTest, GivesWhatTheClaimsSay)
         {"realm.roles", QStringLiteral("qa"), "anna 5"},
         {"realm", QStringLiteral("qa"), "anna 1"},
     };
-    for (const auto& each : kClaims)
-        EXPECT_EQ(check(issuer().token(TokenIssuer::claimsWith(each.name, each.value))), each.verdict)
-            << each.name;
+    for (const auto& [name, value, verdict] : kClaims)
+        EXPECT_EQ(check(issuer().token(TokenIssuer::claimsWith(name, value))), verdict) << name;
 }
 
 struct BadToken

@@ -24,15 +24,11 @@ protected:
         probe.start(QStringLiteral("unshare"), {QStringLiteral("-rm"), QStringLiteral("true")});
         if (!probe.waitForFinished(kTimeout) || probe.exitCode() != 0)
             GTEST_SKIP() << "the system gives no file systems of one's own";
-        QFile script(path("mounted"));
-        ASSERT_TRUE(script.open(QIODevice::WriteOnly));
-        script.write("#!/bin/sh\nmount -t tmpfs -o size=16m none " + path("store").toUtf8() +
-                     " && exec \"$@\"\n");
-        script.setPermissions(QFile::ReadOwner | QFile::WriteOwner | QFile::ExeOwner);
-        script.close();
+        putFile(path("mounted"),
+                "#!/bin/sh\nmount -t tmpfs -o size=16m none " + path("store").toUtf8() + " && exec \"$@\"\n");
+        QFile::setPermissions(path("mounted"), QFile::ReadOwner | QFile::WriteOwner | QFile::ExeOwner);
         QDir().mkpath(path("store"));
-        serve({QStringLiteral("--stow"), QStringLiteral("--dicom"), QStringLiteral("127.0.0.1:0")}, "",
-              ("unshare -rm " + path("mounted").toUtf8()).constData());
+        serve("--stow --dicom 127.0.0.1:0", "", "unshare -rm " + path("mounted").toUtf8());
     }
 
     /// Below the server's own disk.
@@ -62,22 +58,16 @@ protected:
 
     int stow(const QByteArray& content) const
     {
-        Client client(mAddress);
-        client.send(
-            "POST /dicom-web/studies HTTP/1.1\r\nHost: localhost\r\nContent-Type: application/dicom\r\n"
-            "Content-Length: " +
-            QByteArray::number(content.size()) + "\r\n\r\n" + content);
-        return client.reply().status;
+        return ask("POST", "studies", "application/dicom", content).status;
     }
 
     int associate(const QByteArray& uid, const QByteArray& content) const
     {
-        RawCaller caller(mDicom);
-        caller.associate({{kCapture, {UID_LittleEndianExplicitTransferSyntax}}});
+        RawCaller caller(mDicom, {{kCapture, {UID_LittleEndianExplicitTransferSyntax}}});
         return caller.store(kCapture, uid, datasetOf(content));
     }
 
-    int found() const { return QJsonDocument::fromJson(get("studies/1.2/instances").body).array().size(); }
+    int found() const { return jsonAt(get("studies/1.2/instances").body).toArray().size(); }
 
     const Setting mWatermark{"KDD_FREE_SPACE", "0"};
 
