@@ -76,7 +76,7 @@ const std::map<std::string, std::pair<std::vector<std::int32_t>, const char*>> k
     {"wide", {{3, 1, 1, 0, 0, 0}, "abc"}},        {"negative", {{2, -1, 1, 0, 0, 0}, "ab"}},
     {"many-samples", {{2, 1, 3, 0, 0, 0}, "ab"}}, {"other-type", {{2, 1, 1, 2, 0, 0}, "ab"}},
     {"no-type", {{2, 1, 1, 77, 0, 0}, "ab"}},     {"other-colour", {{2, 1, 1, 0, 2, 0}, "ab"}},
-    {"reduced", {{2, 1, 1, 0, 0, 1}, "a"}},       {"short-pixels", {{2, 1, 1, 0, 0, 0}, "a"}},
+    {"reduced", {{1, 1, 1, 0, 0, 1}, "a"}},       {"short-pixels", {{2, 1, 1, 0, 0, 0}, "a"}},
     {"long-pixels", {{2, 1, 1, 0, 0, 0}, "abc"}},
 };
 

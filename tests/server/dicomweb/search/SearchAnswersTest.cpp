@@ -234,6 +234,8 @@ const std::tuple<const char*, const char*> kNames[] = {
     {"oh*", ""},
     {"d*^j*", "4 5"},
     {"d?e", "4 5 6"},
+    {"?we", ""},
+    {"=*oe*", ""},
     {"d*e", "4 5 6 91"},
     {"strasse", "7"},
     {"*%*", "7"},
@@ -257,6 +259,7 @@ TEST_P(SearchAnswers, FindPersonsByComponentAndGroup)
         {"8", "AB^J[1]"},
         {"9", "=\xe5\xb1\xb1\xe7\x94\xb0^\xe5\xa4\xaa\xe9\x83\x8e"},
         {"91", "Dowe^X"},
+        {"92", "Dan^X=Yee^Jo=Roe"},
     };
     for (const auto& [uid, person] : kPersons)
         store(uid.constData(), image(uid + ".1.1", uid, uid + ".1")
