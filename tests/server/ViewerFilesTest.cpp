@@ -77,7 +77,7 @@ protected:
 
 TEST_F(ViewerFilesTest, AreThoseBelowTheFolderAndNoOthers)
 {
-    const std::tuple<const char*, const char*> kTargets[] = {
+    const std::pair<const char*, const char*> kTargets[] = {
         {"/viewer/", "200 text/html start"},
         {"/viewer", "308 viewer/"},
         {"/viewer?a=b", "308 viewer/?a=b"},

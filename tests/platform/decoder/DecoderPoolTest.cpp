@@ -27,7 +27,7 @@ const char* const kBroken = "The decoder gave an answer that cannot be and was e
 const char* const kFalseFrame = "The decoder gave a frame that cannot be";
 
 /// What a decoder does, and how what is said of it ends.
-const std::tuple<const char*, const char*> kFaults[] = {
+const std::pair<const char*, const char*> kFaults[] = {
     {"aborts", "It ended the decoder (signal 6)"},
     {"leaves", "It ended the decoder (status 7)"},
     {"half", "It ended the decoder (status 0)"},

@@ -42,7 +42,7 @@ TEST(AccessRules, SayWhoMayWhat)
 TEST(AccessRules, OpenNoDoorByASlip)
 {
     const QByteArray tokens = QByteArray(R"({"tokens":{)") + kTokens;
-    const std::tuple<QByteArray, const char*> kFiles[] = {
+    const std::pair<QByteArray, const char*> kFiles[] = {
         {"", "no JSON object"},
         {"[]", "no JSON object"},
         {R"({"anyone":[],"anyone":["read"]})", "says something twice"},

@@ -63,7 +63,7 @@ TEST(AddressGuard, BelievesOnlyNamedProxies)
 
 TEST(AddressGuard, TakesOfAProxyOnlyWhatCanBeAnAddress)
 {
-    const std::tuple<Http::Field, const char*> kHeaders[] = {
+    const std::pair<Http::Field, const char*> kHeaders[] = {
         {{"forwarded", "for=1.2.3.4;proto=https;host=\"pacs.example:1\""}, "https://pacs.example:1"},
         {{"forwarded", "host=far.example;proto=ftp, Proto=HTTPS;Host=pacs.example"}, "https://pacs.example"},
         {{"forwarded", "for=\"[::1]:80\""}, "http://localhost:80"},
@@ -83,7 +83,7 @@ TEST(AddressGuard, TakesOfAProxyOnlyWhatCanBeAnAddress)
 
 TEST(AddressRules, NameTheValueThatTheyCannotFollow)
 {
-    const std::tuple<AddressRules, const char*> kRules[] = {
+    const std::pair<AddressRules, const char*> kRules[] = {
         {{"images.example.org", {}, {}}, "images.example.org"},
         {{"ftp://images.example.org", {}, {}}, "ftp://images.example.org"},
         {{"https://", {}, {}}, "https:"},

@@ -118,7 +118,7 @@ TEST_F(ServedAccess, KnowsClientsByTheirCertificates)
     useTls();
     start();
     const TlsFiles stranger;
-    const std::tuple<const TlsFiles*, int> kClients[] = {{&other, 200}, {nullptr, 403}, {&stranger, 0}};
+    const std::pair<const TlsFiles*, int> kClients[] = {{&other, 200}, {nullptr, 403}, {&stranger, 0}};
     for (const auto& [shown, status] : kClients)
         for (const char* version : {"TLSv1.2", "TLSv1.3"}) {
             Client client(mServer->address(), shown, {{"MaxProtocol", version}});

@@ -74,7 +74,7 @@ TEST(SessionSeal, TakesNoKeysThatAreNone)
 TEST(ProviderAddressesTest, AreOfTheIssuerAndEncrypted)
 {
     const QByteArray good = R"({"issuer":"i","authorization_endpoint":"https://a.example/b?c=d",)";
-    const std::tuple<QByteArray, bool> kTexts[] = {
+    const std::pair<QByteArray, bool> kTexts[] = {
         {good + R"("token_endpoint":"https://a.example/t"})", true},
         {good + R"("token_endpoint":"http://127.0.0.1:80/t"})", true},
         {good + R"("token_endpoint":"http://a.example/t"})", false},

@@ -175,7 +175,7 @@ TEST_F(SignInTest, LetsNobodyInWithWhatIsNotHis)
 TEST_F(SignInTest, LeadsNowhereElse)
 {
     start();
-    const std::tuple<const char*, const char*> kPlaces[] = {
+    const std::pair<const char*, const char*> kPlaces[] = {
         {"/viewer/?a=b", "/viewer/?a=b"}, {"", "/"},
         {"https://evil.example/", "/"},   {"//evil.example/", "/"},
         {"/\\evil.example", "/"},         {"viewer", "/"},
@@ -198,7 +198,7 @@ TEST_F(SignInTest, ChangesNothingForPagesOfOthers)
     start();
     signIn();
     const QByteArray sent = anImage("1.2.3.1").file();
-    const std::tuple<const char*, int> kOrigins[] = {
+    const std::pair<const char*, int> kOrigins[] = {
         {"", 403},
         {"Origin: https://evil.example\r\n", 403},
         {"Origin: null\r\n", 403},

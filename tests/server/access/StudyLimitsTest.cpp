@@ -114,7 +114,7 @@ TEST_F(StudyLimits, AnswerOfEveryResourceAsIfOthersDidNotExist)
 
 TEST_F(StudyLimits, FollowTheClaim)
 {
-    const std::tuple<QJsonValue, const char*> kClaims[] = {
+    const std::pair<QJsonValue, const char*> kClaims[] = {
         {QStringLiteral("North"), "1.2"},
         {QJsonArray{QStringLiteral("South"), QStringLiteral("Nowhere")}, "1.9"},
         {QJsonArray{QStringLiteral("South"), QStringLiteral("North")}, "1.2 1.9"},
@@ -199,7 +199,7 @@ TEST_F(StudyLimits, AreRefusedWhereTheyKeepNothing)
 {
     const QByteArray begin =
         R"({"tokens":{"issuer":"i","audience":"a","keys":"k","rights":[{"gives":["read"]}],)";
-    const std::tuple<QByteArray, const char*> kFiles[] = {
+    const std::pair<QByteArray, const char*> kFiles[] = {
         {begin + R"("studies":[{"claim":"c","attribute":"ReferringPhysicianName"}]}})", ""},
         {begin + R"("studies":[{"claim":"c","attribute":"0020000D"}]}})", ""},
         {begin + R"("studies":[{"claim":"c","attribute":"InstitutionNam"}]}})", "no attribute by which"},

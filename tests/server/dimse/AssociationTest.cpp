@@ -120,7 +120,7 @@ TEST_F(AssociationTest, SurvivesWhatNobodyShouldSend)
     for (int i = 0; i < 1000; ++i)
         nested += QByteArray("\x08\0\x40\x11\xff\xff\xff\xff\xfe\xff\x00\xe0\xff\xff\xff\xff", 16);
     // bytes: behind a request
-    const std::tuple<const char*, QByteArray> kHostile[] = {
+    const std::pair<const char*, QByteArray> kHostile[] = {
         {"unknown kind of PDU", RawCaller::pdu(9, "abcd")},
         {"second request", request},
         {"PDU larger than agreed", RawCaller::pdu(4, QByteArray(200000, 'x'))},

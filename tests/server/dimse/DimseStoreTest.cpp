@@ -48,7 +48,7 @@ TEST_F(DimseStore, ShowsWhatItToldWasStoredInTheNextAnswer)
 TEST_F(DimseStore, KeepsTheBytesOfADatasetHoweverTheyComeInPieces)
 {
     const DatasetBuilder image = anImage().with(DCM_PatientName, "Doe^J").words(std::vector<Uint16>(5000, 7));
-    const std::tuple<QByteArray, E_TransferSyntax> kForms[] = {
+    const std::pair<QByteArray, E_TransferSyntax> kForms[] = {
         {kExplicit, EXS_LittleEndianExplicit},
         {kImplicit, EXS_LittleEndianImplicit},
         {UID_BigEndianExplicitTransferSyntax, EXS_BigEndianExplicit}};

@@ -13,7 +13,7 @@ namespace
 
 TEST(PeersFileTest, IsRefusedForEverySlipWithItsPlace)
 {
-    const std::tuple<const char*, const char*> kSlips[] = {
+    const std::pair<const char*, const char*> kSlips[] = {
         {"", "no JSON object"},
         {"[]", "no JSON object"},
         {"{}", "lets nobody in"},

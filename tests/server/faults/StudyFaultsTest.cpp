@@ -121,7 +121,7 @@ TEST_F(StudyFaults, WhatBecomesOfATagFileShowsAtOnce)
     putFile(tagFile(), older);
     const Reply restored = get("studies/1.2/metadata");
     EXPECT_TRUE(restored.body == first.body && restored.header("ETag") == first.header("ETag"));
-    const std::tuple<QByteArray, int> kFaults[] = {
+    const std::pair<QByteArray, int> kFaults[] = {
         {older.left(older.size() / 2), 500}, {"nonsense", 500}, {QByteArray(), 503}};
     for (const auto& [content, status] : kFaults) {
         putFile(tagFile(), content);

@@ -14,7 +14,7 @@ const QVector<MediaType> kOffers = {{"application/dicom+json", ""},
                                     {"image/jpeg", ""}};
 
 /// What is accepted and which of the offers is chosen.
-const std::tuple<const char*, int> kChoices[] = {
+const std::pair<const char*, int> kChoices[] = {
     {"*/*", 0},
     {"", -1},
     {"application/dicom+json", 0},

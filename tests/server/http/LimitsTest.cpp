@@ -20,7 +20,7 @@ Http::Response pathAsText(const Http::Request& request)
 TEST(HttpLimits, AreToldToWhoeverGoesBeyondThem)
 {
     const QByteArray start = "GET / HTTP/1.1\r\nHost: localhost\r\n";
-    const std::tuple<QByteArray, int> kRequests[] = {
+    const std::pair<QByteArray, int> kRequests[] = {
         {"nonsense\r\n\r\n", 400},
         {"GET / HTTP/1.1\r\n\r\n", 400},
         {start + "Host: elsewhere\r\n\r\n", 400},

@@ -82,7 +82,7 @@ TEST(MultipartReader, FindsThePartsHoweverTheBytesCome)
 TEST(MultipartReader, TakesNoMoreThanItHasTo)
 {
     const QByteArray part = "\r\n" + kOne + "x";
-    const std::tuple<QByteArray, const char*> kHostile[] = {
+    const std::pair<QByteArray, const char*> kHostile[] = {
         {QByteArray(70000, 'x'), "does not begin with a part"},
         {"--ab\r\na: " + QByteArray(20000, 'x'), "header of a part is too large"},
         {"--ab\r\n" + QByteArray("a: b\r\n").repeated(4000) + "\r\n", "header of a part is too large"},

@@ -26,7 +26,7 @@ std::string partsOf(const QByteArray& target)
 
 TEST(RequestTarget, IsTakenApartAndDecoded)
 {
-    const std::tuple<const char*, const char*> kTargets[] = {
+    const std::pair<const char*, const char*> kTargets[] = {
         {"/", "||"},
         {"*", "||"},
         {"/dicom-web/studies?limit=5&limit=6", "|dicom-web/studies|limit=5&limit=6"},

@@ -13,7 +13,7 @@ namespace
 {
 
 /// What stands in Range, and what is meant of ten bytes: "offset+length", "all" or "none".
-const std::tuple<const char*, const char*> kRanges[] = {
+const std::pair<const char*, const char*> kRanges[] = {
     {"", "all"},
     {"bytes=0-3", "0+4"},
     {"bytes=4-", "4+6"},

@@ -228,7 +228,7 @@ TEST_F(StoreTest, AnswersWhatItCannotTakeBeforeItComes)
     start();
     const QByteArray part = partOf(anImage("1.2.3.1").file());
     const QByteArray boundary(201, 'b');
-    const std::tuple<QByteArray, int> kTypes[] = {
+    const std::pair<QByteArray, int> kTypes[] = {
         {"multipart/form-data; boundary=cut", 415},
         {"multipart/related; type=\"application/dicom+json\"; boundary=cut", 415},
         {"multipart/related; type=\"application/dicom\"", 400},

@@ -120,7 +120,7 @@ TEST_P(SearchAnswers, GoDownTheLevels)
     EXPECT_EQ(values("studies/9/series", "0020000E"), "");
 }
 
-const std::tuple<const char*, const char*> kSearches[] = {
+const std::pair<const char*, const char*> kSearches[] = {
     {"PatientName=*ULL*", "1.1"},
     {"00100010=m%C3%BCller%5Eeva", "1.1"},
     {"PatientName=m?ller", "1.1"},
@@ -165,7 +165,7 @@ TEST_P(SearchAnswers, FindWhatIsAskedFor)
         EXPECT_EQ(studies(query), found) << query;
 }
 
-const std::tuple<const char*, const char*> kTexts[] = {
+const std::pair<const char*, const char*> kTexts[] = {
     {"ISO_IR 13", "\xd4\xcf\xc0\xde^\xc0\xdb\xb3"},  // katakana, one with a mark of its own
     {"ISO_IR 13", "A~1"},                            // whose tilde is an overline
     {"ISO 2022 IR 13\\ISO 2022 IR 87", "Ono~2"},
@@ -198,7 +198,7 @@ TEST_P(SearchAnswers, FindWhatTheyShow)
     }
 }
 
-const std::tuple<const char*, const char*> kNames[] = {
+const std::pair<const char*, const char*> kNames[] = {
     {"harris^", "1"},
     {"^harris", "2"},
     {"Harris", "1"},  // one that names no component asks for the first
