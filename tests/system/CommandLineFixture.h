@@ -62,6 +62,13 @@ protected:
         return answer;
     }
 
+    /// What a server tells of itself once it has begun.
+    static QByteArray toldBy(QProcess& server)
+    {
+        EXPECT_TRUE(server.waitForReadyRead(kTimeout)) << server.readAllStandardError().toStdString();
+        return server.readLine();
+    }
+
     Answer kdd(const QByteArray& arguments, const QStringList& more = {}) const
     {
         return finish(*start(arguments, more));

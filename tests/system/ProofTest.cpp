@@ -66,8 +66,7 @@ TEST_F(Proof, AServerLooksInTheBackground)
     const Setting rate("KDD_CHECK_RATE", "100");
     const Setting heals("KDD_CHECK_HEALS", "1");
     const auto server = start("--json serve --listen 127.0.0.1:0 --status 127.0.0.1:0");
-    ASSERT_TRUE(server->waitForReadyRead(kTimeout)) << server->readAllStandardError().toStdString();
-    const QByteArray status = jsonAt(server->readLine(), "status").toString().toLatin1();
+    const QByteArray status = jsonAt(toldBy(*server), "status").toString().toLatin1();
     QByteArray counted;
     const auto isDone = [&] {
         return counted.contains("kdd_check_studies 2\n") && counted.contains("kdd_check_faulty_studies 1\n");

@@ -63,8 +63,7 @@ protected:
     void expectServed() const
     {
         const std::unique_ptr<QProcess> server = start("--json serve --listen 127.0.0.1:0");
-        ASSERT_TRUE(server->waitForReadyRead(kTimeout));
-        Client client(jsonAt(server->readLine(), "address").toString().toLatin1());
+        Client client(jsonAt(toldBy(*server), "address").toString().toLatin1());
         EXPECT_EQ(QJsonDocument::fromJson(client.ask("/dicom-web/studies/1.2/metadata").body).array().size(),
                   4);
         EXPECT_EQ(client

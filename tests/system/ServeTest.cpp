@@ -10,8 +10,7 @@ using Serve = CommandLine;
 TEST_F(Serve, TellsItsAddressesAndEndsWhenItIsAsked)
 {
     const auto process = start("--json serve --listen [::1]:0 --status 127.0.0.1:0 --threads 1");
-    ASSERT_TRUE(process->waitForReadyRead(kTimeout)) << process->readAllStandardError().toStdString();
-    const QByteArray told = process->readLine();
+    const QByteArray told = toldBy(*process);
     EXPECT_EQ(textAt(told, "address").rfind("http://[::1]:", 0), 0U) << told.toStdString();
     EXPECT_EQ(textAt(told, "status").rfind("http://127.0.0.1:", 0), 0U) << told.toStdString();
     process->terminate();
@@ -21,8 +20,7 @@ TEST_F(Serve, TellsItsAddressesAndEndsWhenItIsAsked)
 TEST_F(Serve, ReceivesWithoutRequestsWhenThatIsAskedFor)
 {
     const auto process = start("--json receive 127.0.0.1:0");
-    ASSERT_TRUE(process->waitForReadyRead(kTimeout)) << process->readAllStandardError().toStdString();
-    const QString address = jsonAt(process->readLine(), "dicom").toString();
+    const QString address = jsonAt(toldBy(*process), "dicom").toString();
     save("1", anImage("1"));
     QProcess sender;
     sender.start(QStringLiteral("storescu"),

@@ -89,14 +89,8 @@ TEST_F(TokenCheckTest, GivesWhatTheClaimsSay)
         EXPECT_EQ(check(issuer().token(TokenIssuer::claimsWith(name, value))), verdict) << name;
 }
 
-struct BadToken
-{
-    const char* name;
-    QByteArray token;
-    const char* fault;
-};
-
-std::vector<BadToken> badTokens()
+/// By name, and what is said of each.
+std::vector<std::tuple<const char*, QByteArray, const char*>> badTokens()
 {
     const auto with = [](const char* name, const QJsonValue& value) {
         return issuer().token(TokenIssuer::claimsWith(name, value));
@@ -175,8 +169,8 @@ std::vector<BadToken> badTokens()
 
 TEST_F(TokenCheckTest, TakesNothingElse)
 {
-    for (const BadToken& bad : badTokens())
-        EXPECT_EQ(check(bad.token), bad.fault) << bad.name;
+    for (const auto& [name, token, fault] : badTokens())
+        EXPECT_EQ(check(token), fault) << name;
     EXPECT_EQ(mLog.count("anna"), 0);
 }
 
