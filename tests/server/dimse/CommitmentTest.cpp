@@ -1,8 +1,6 @@
 #include "server/dimse/DimseFixture.h"
 #include "server/dimse/OnlyPatient.h"
 
-#include <dcmtk/dcmnet/scp.h>
-#include <dcmtk/dcmnet/scu.h>
 #include <gmock/gmock.h>
 
 using namespace Kdd;
@@ -11,63 +9,6 @@ using testing::Not;
 
 namespace
 {
-
-constexpr int kPatience = 60;  // [s]
-const char* const kPushModel = UID_StorageCommitmentPushModelSOPClass;
-
-/// "1.2.3.1 kept at KDD", "1.2.3.2 failed 0112": a line for each object of a sequence.
-std::string linesOf(DcmDataset& told, const DcmTagKey& key, const char* word)
-{
-    QString lines;
-    DcmItem* item = nullptr;
-    for (long i = 0; told.findAndGetSequenceItem(key, item, i).good(); ++i) {
-        OFString uid;
-        OFString title;
-        Uint16 reason = 0;
-        item->findAndGetOFString(DCM_ReferencedSOPInstanceUID, uid);
-        item->findAndGetOFString(DCM_RetrieveAETitle, title);
-        const bool hasFailed = item->findAndGetUint16(DCM_FailureReason, reason).good();
-        lines += hasFailed ? QString::asprintf("%s %s %04X\n", uid.c_str(), word, unsigned(reason))
-                           : QString::asprintf("%s %s%s%s\n", uid.c_str(), word, title.empty() ? "" : " at ",
-                                               title.c_str());
-    }
-    return lines.toStdString();
-}
-
-/// What an event says; nothing of one that did not come.
-std::string textOf(const OFCondition& came, Uint16 event, const std::unique_ptr<DcmDataset>& told)
-{
-    OFString transaction;
-    if (came.bad() || told == nullptr)
-        return "not told\n";
-    told->findAndGetOFString(DCM_TransactionUID, transaction);
-    return "event " + std::to_string(event) + " of " + transaction.c_str() + '\n' +
-           linesOf(*told, DCM_ReferencedSOPSequence, "kept") +
-           linesOf(*told, DCM_FailedSOPSequence, "failed");
-}
-
-/// A modality that the server calls to tell it.
-class Listener : public DcmSCP
-{
-public:
-    std::string said;
-
-protected:
-    OFCondition handleIncomingCommand(T_DIMSE_Message* message,
-                                      const DcmPresentationContextInfo& context) override
-    {
-        if (message->CommandField != DIMSE_N_EVENT_REPORT_RQ)
-            return DIMSE_BADCOMMANDTYPE;
-        DcmDataset* told = nullptr;
-        Uint16 event = 0;
-        const OFCondition came =
-            handleEVENTREPORTRequest(message->msg.NEventReportRQ, context.presentationContextID, told, event);
-        said = textOf(came, event, std::unique_ptr<DcmDataset>(told));
-        return came;
-    }
-    OFBool stopAfterCurrentAssociation() override { return !said.empty(); }
-    OFBool stopAfterConnectionTimeout() override { return OFTrue; }
-};
 
 class CommitmentTest : public DimseFixture
 {
@@ -80,52 +21,14 @@ protected:
     }
 
     /// What a modality is told that asks for objects, "1.2.3.1" or "CLASS=1.2.3.1"; at a port, when it has left.
-    std::string ask(const QByteArray& objects, quint16 at = 0, const char* title = "CT1") const
+    std::string ask(const QByteArray& objects, quint16 at = 0, const QByteArray& title = "CT1") const
     {
-        OFList<OFString> syntaxes;
-        syntaxes.push_back(UID_LittleEndianImplicitTransferSyntax);
-        Listener listener;
-        listener.setPort(at);
-        listener.setAETitle(title);
-        listener.setConnectionBlockingMode(DUL_NOBLOCK);
-        listener.setConnectionTimeout(kPatience);
-        listener.addPresentationContext(kPushModel, syntaxes, ASC_SC_ROLE_SCP);
-        EXPECT_TRUE(at == 0 || listener.openListenPort().good());
-        DcmSCU asker;
-        asker.setAETitle(title);
-        asker.setPeerAETitle("KDD");
-        asker.setPeerHostName("127.0.0.1");
-        asker.setPeerPort(dicomPort(*mServer));
-        asker.setDIMSETimeout(kPatience);
-        asker.addPresentationContext(kPushModel, syntaxes);
-        if (asker.initNetwork().bad() || asker.negotiateAssociation().bad())
-            return "no association\n";
-        DcmDataset request;
-        request.putAndInsertString(DCM_TransactionUID, "1.9.9");
-        for (const QByteArray& object : objects.split(' ')) {
-            DcmItem* item = nullptr;
-            const int equals = object.indexOf('=');
-            request.findOrCreateSequenceItem(DCM_ReferencedSOPSequence, item, -2);
-            item->putAndInsertString(DCM_ReferencedSOPClassUID, equals < 0 ? kCapture : object.left(equals));
-            item->putAndInsertString(DCM_ReferencedSOPInstanceUID, object.mid(equals + 1));
-        }
-        Uint16 status = 0;
-        if (asker
-                .sendACTIONRequest(asker.findPresentationContextID(kPushModel, ""),
-                                   UID_StorageCommitmentPushModelSOPInstance, 1, &request, status)
-                .bad())
-            return "no answer\n";
-        std::string said = QString::asprintf("status %04X\n", unsigned(status)).toStdString();
-        DcmDataset* told = nullptr;
-        Uint16 event = 0;
-        if (status == 0 && at == 0) {
-            const OFCondition came = asker.handleEVENTREPORTRequest(told, event, kPatience);
-            said += textOf(came, event, std::unique_ptr<DcmDataset>(told));
-        }
-        asker.releaseAssociation();
-        if (status == 0 && at != 0)
-            listener.acceptAssociations();
-        return said + listener.said;
+        QByteArray arguments = port().toLatin1() + ' ' + title + " 1.9.9 " + QByteArray::number(at);
+        for (const QByteArray& object : objects.split(' '))
+            arguments += ' ' + (object.contains('=') ? object : kCapture + '=' + object);
+        QProcess process;
+        process.start(QStringLiteral(COMMITMENT_SCU), words(arguments));
+        return finish(process).text.toStdString();
     }
 
     /// The status of the answer to a request with that dataset, after which nobody waits.
