@@ -13,6 +13,7 @@
 #include <QProcess>
 
 #include <gtest/gtest.h>
+#include <kddlib/Catalogue.h>
 #include <kddlib/Kxg.h>
 
 #include <stdexcept>
@@ -70,14 +71,18 @@ inline quint16 dicomPort(const Server& server)
     return address.mid(address.lastIndexOf(':') + 1).toUShort();
 }
 
+/// The arguments of a command line, which are parted by blanks.
+inline QStringList words(const QByteArray& line)
+{
+    return QString::fromUtf8(line).split(QLatin1Char(' '), Qt::SkipEmptyParts);
+}
+
 /// Runs the tool over a store with its tag files and a database; its exit code.
 inline int runTool(const QString& store, const QByteArray& database, const QStringList& arguments)
 {
     QProcess process;
     process.start(QStringLiteral(KDD_BINARY),
-                  QStringList{QStringLiteral("--store"), store, QStringLiteral("--database"),
-                              QString::fromUtf8(database), QStringLiteral("--quiet")} +
-                      arguments);
+                  words("--quiet --store " + store.toUtf8() + " --database " + database) + arguments);
     EXPECT_TRUE(process.waitForFinished(120000));
     EXPECT_EQ(process.exitStatus(), QProcess::NormalExit) << process.readAllStandardError().constData();
     return process.exitCode();
@@ -134,13 +139,18 @@ protected:
         return QJsonDocument::fromJson(get("/studies/" + study + "/instances").body).array().size();
     }
 
+    std::unique_ptr<Kxg::Catalogue> catalogue() const
+    {
+        Result result;
+        return Kxg::Catalogue::open(mDatabase, result);
+    }
+
     QStringList storedFiles() const { return objectsBelow(mStore.filePath("objects")); }
 
     /// Runs the tool over the same archive, which has to succeed.
-    void kdd(const QStringList& arguments) const
+    void kdd(const QByteArray& arguments) const
     {
-        EXPECT_EQ(runTool(mStore.folder(), mDatabase, arguments), 0)
-            << arguments.join(QLatin1Char(' ')).toStdString();
+        EXPECT_EQ(runTool(mStore.folder(), mDatabase, words(arguments)), 0) << arguments.constData();
     }
 
     LogCapture mLog;

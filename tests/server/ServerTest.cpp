@@ -18,8 +18,7 @@ protected:
     static Reply get(const QByteArray& address, const QByteArray& path, const QByteArray& headers = {})
     {
         Client client(address);
-        client.get(path, headers);
-        return client.reply();
+        return client.ask(path, headers);
     }
 };
 

@@ -34,6 +34,18 @@ DatasetBuilder& DatasetBuilder::with(const DcmTag& tag, const char* value)
     return *this;
 }
 
+DatasetBuilder& DatasetBuilder::with(const QByteArray& attributes)
+{
+    for (const QByteArray& attribute : attributes.split('|')) {
+        const QByteArray name = attribute.split('=').front();
+        DcmTag tag;
+        if (DcmTag::findTagFromName(name.constData(), tag).bad())
+            throw std::invalid_argument("the test names no attribute");
+        with(tag, attribute.mid(name.size() + 1).constData());
+    }
+    return *this;
+}
+
 DatasetBuilder& DatasetBuilder::bytes(const std::vector<Uint8>& values, const DcmTagKey& key)
 {
     mDataset->putAndInsertUint8Array(DcmTag(key, EVR_OB), values.data(), values.size());
@@ -59,15 +71,16 @@ DatasetBuilder& DatasetBuilder::withLong(const DcmTag& tag, int length)
 
 DatasetBuilder& DatasetBuilder::fragments(E_TransferSyntax xfer, const std::vector<int>& sizes)
 {
+    QVector<QByteArray> parts;
+    for (const int size : sizes)
+        parts.append(QByteArray(size, 1));
+    return fragments(xfer, parts);
+}
+
+DatasetBuilder& DatasetBuilder::fragments(E_TransferSyntax xfer, const QVector<QByteArray>& parts)
+{
     auto* pixels = new DcmPixelData(DcmTag(DCM_PixelData, EVR_OB));
-    auto* sequence = new DcmPixelSequence(DcmTag(DCM_PixelData, EVR_OB));
-    for (const int size : sizes) {
-        auto* fragment = new DcmPixelItem(DcmTag(DCM_Item, EVR_OB));
-        fragment->putUint8Array(std::vector<Uint8>(static_cast<std::size_t>(size), 1).data(),
-                                static_cast<unsigned long>(size));
-        sequence->insert(fragment);
-    }
-    pixels->putOriginalRepresentation(xfer, nullptr, sequence);
+    pixels->putOriginalRepresentation(xfer, nullptr, sequenceOf(parts).release());
     return with(pixels);
 }
 
@@ -156,6 +169,18 @@ DatasetBuilder aSlice(const char* sopUID, int number, double z, double y, double
         .with(DCM_ImageOrientationPatient, "1\\0\\0\\0\\1\\0")
         .with(DCM_PixelSpacing, "0.25\\0.5")
         .words({0, 1, 2, 3, 1000, 2000, 3000, 4000, 4095, 5, 6, 7});
+}
+
+std::unique_ptr<DcmPixelSequence> sequenceOf(const QVector<QByteArray>& parts)
+{
+    auto sequence = std::make_unique<DcmPixelSequence>(DcmTag(DCM_PixelData, EVR_OB));
+    for (const QByteArray& part : parts) {
+        auto* fragment = new DcmPixelItem(DcmTag(DCM_Item, EVR_OB));
+        fragment->putUint8Array(reinterpret_cast<const Uint8*>(part.constData()),
+                                static_cast<unsigned long>(part.size()));
+        sequence->insert(fragment);
+    }
+    return sequence;
 }
 
 DatasetBuilder anItem()

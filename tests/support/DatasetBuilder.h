@@ -1,6 +1,7 @@
 #pragma once
 
 #include <QString>
+#include <QVector>
 
 #include <dcmtk/config/osconfig.h>
 
@@ -27,6 +28,9 @@ public:
     /// A text, or numbers as text for the binary VRs.
     DatasetBuilder& with(const DcmTag& tag, const char* value);
 
+    /// Several texts by their names: "PatientID=P1|PatientName=Doe^J".
+    DatasetBuilder& with(const QByteArray& attributes);
+
     /// Binary values by the VR that goes with them: OB, OW and US.
     DatasetBuilder& bytes(const std::vector<Uint8>& values, const DcmTagKey& key = DCM_PixelData);
     DatasetBuilder& words(const std::vector<Uint16>& values, const DcmTagKey& key = DCM_PixelData);
@@ -37,6 +41,7 @@ public:
 
     /// Compressed pixels in fragments of so many bytes, the first of which is the table of offsets.
     DatasetBuilder& fragments(E_TransferSyntax xfer, const std::vector<int>& sizes);
+    DatasetBuilder& fragments(E_TransferSyntax xfer, const QVector<QByteArray>& parts);
 
     /// Binary values of any VR.
     DatasetBuilder& data(const DcmTag& tag, const QByteArray& values);
@@ -81,6 +86,9 @@ DatasetBuilder aPicture(int rows, int columns, int bitsAllocated, const char* ph
 
 /// An axial image of 4 x 3 pixels of 16 bits, half a millimetre wide and 0.25 mm high, at (x, y, z) [mm].
 DatasetBuilder aSlice(const char* sopUID, int number, double z, double y = 0, double x = 0);
+
+/// Compressed pixel data; the first part is the table of offsets.
+std::unique_ptr<DcmPixelSequence> sequenceOf(const QVector<QByteArray>& parts);
 
 /// Without any attribute, for sequences.
 DatasetBuilder anItem();

@@ -12,9 +12,7 @@ namespace
 {
 
 /// The commands that work on a whole archive through its database.
-class Archive : public CommandLine
-{
-};
+using Archive = CommandLine;
 
 TEST_F(Archive, WhatIsIndexedWaitsAndWhatIsBuiltDoesNot)
 {
@@ -44,14 +42,8 @@ const char* const kFilters[][2] = {
 
 TEST_F(Archive, ListsTheStudiesThatAreAskedFor)
 {
-    save(
-        "2",
-        anImage("2").with(DCM_PatientName, "Doe^J").with(DCM_Modality, "CT").with(DCM_StudyDate, "20240131"));
-    save("3", anImage("3")
-                  .inStudy("1.3")
-                  .with(DCM_PatientID, "P77")
-                  .with(DCM_Modality, "MR")
-                  .with(DCM_StudyDate, "20240229"));
+    save("2", anImage("2").with("PatientName=Doe^J|Modality=CT|StudyDate=20240131"));
+    save("3", anImage("3").inStudy("1.3").with("PatientID=P77|Modality=MR|StudyDate=20240229"));
     ASSERT_EQ(addImages().exitCode, 0);
     save("4", anImage("4").inStudy("1.4"));
     ASSERT_EQ(kdd("index @").exitCode, 0);

@@ -1,12 +1,11 @@
 #pragma once
 
+#include "support/CorrectionJob.h"
 #include "support/DatasetBuilder.h"
 #include "support/FileContent.h"
+#include "support/Json.h"
 
 #include <QDir>
-#include <QJsonArray>
-#include <QJsonDocument>
-#include <QJsonObject>
 #include <QProcess>
 
 #include <memory>
@@ -22,10 +21,7 @@ struct Answer
     QByteArray out;
     QByteArray err;
 
-    QJsonValue json(const char* key) const
-    {
-        return QJsonDocument::fromJson(out).object().value(QLatin1String(key));
-    }
+    QJsonValue json(const char* place) const { return jsonAt(out, place); }
     int number(const char* key) const { return json(key).toInt(-1); }
 };
 
@@ -38,12 +34,12 @@ protected:
     QString file(const char* name) const { return images() + QLatin1Char('/') + QString::fromUtf8(name); }
 
     /// Arguments are separated by blanks, "@NAME" is a file of the folder of images and "@" that itself; `more` follows.
-    std::unique_ptr<QProcess> start(const char* arguments, const QStringList& more = {}) const
+    std::unique_ptr<QProcess> start(const QByteArray& arguments, const QStringList& more = {}) const
     {
         auto process = std::make_unique<QProcess>();
         process->setProgram(QStringLiteral(KDD_BINARY));
         QStringList words{QStringLiteral("--store"), path("store")};
-        for (const QByteArray& word : QByteArray(arguments).split(' ')) {
+        for (const QByteArray& word : arguments.split(' ')) {
             if (word.startsWith('@'))
                 words.append(word.size() == 1 ? images() : file(word.constData() + 1));
             else if (!word.isEmpty())
@@ -66,17 +62,21 @@ protected:
         return answer;
     }
 
-    Answer kdd(const char* arguments, const QStringList& more = {}) const
+    /// What a server tells of itself once it has begun.
+    static QByteArray toldBy(QProcess& server)
+    {
+        EXPECT_TRUE(server.waitForReadyRead(kTimeout)) << server.readAllStandardError().toStdString();
+        return server.readLine();
+    }
+
+    Answer kdd(const QByteArray& arguments, const QStringList& more = {}) const
     {
         return finish(*start(arguments, more));
     }
 
     Answer addImages() const { return kdd("add --json @"); }
 
-    int imagesOf(const char* study) const
-    {
-        return kdd("stat --json", QStringList{QLatin1String(study)}).number("images");
-    }
+    int imagesOf(const QByteArray& study) const { return kdd("stat --json " + study).number("images"); }
 
     void put(const char* name, const QByteArray& content) const { putFile(file(name), content); }
 
@@ -88,12 +88,19 @@ protected:
 
     QByteArray bytes(const char* name) const { return fileContent(file(name)); }
 
+    /// The file of a correction's job.
+    QByteArray job(const DcmTagKey& key, const QByteArray& value, const QByteArray& oldStudy = {}) const
+    {
+        putFile(path("job.xml"), jobXml(key, value, oldStudy));
+        return path("job.xml").toUtf8();
+    }
+
     /// Two series of study 1.2 with images 1 and 2, 3; study 1.3 with image 4.
     void addTwoStudies() const
     {
-        save("1", anImage("1").with(DCM_PatientName, "Doe^J").withLong(DCM_TextValue, 3000));
-        save("2", anImage("2").inSeries("1.2.4").with(DCM_PatientName, "Doe^J"));
-        save("3", anImage("3").inSeries("1.2.4").with(DCM_PatientName, "Doe^J").with(DCM_Modality, "MR"));
+        save("1", anImage("1").with("PatientName=Doe^J").withLong(DCM_TextValue, 3000));
+        save("2", anImage("2").inSeries("1.2.4").with("PatientName=Doe^J"));
+        save("3", anImage("3").inSeries("1.2.4").with("PatientName=Doe^J|Modality=MR"));
         save("4", anImage("4").inStudy("1.3").inSeries("1.3.1"));
         const Answer added = addImages();
         EXPECT_EQ(added.exitCode, 0);
@@ -105,9 +112,8 @@ protected:
     std::string listed(const QByteArray& arguments = QByteArray()) const
     {
         QStringList uids;
-        for (const QJsonValue& study :
-             kdd(("list --json " + arguments).constData()).json("studies").toArray())
-            uids.append(study.toObject().value(QLatin1String("study")).toString());
+        for (const QJsonValue& study : kdd("list --json " + arguments).json("studies").toArray())
+            uids.append(jsonAt(study, "study").toString());
         uids.sort();
         return uids.join(QLatin1Char(' ')).toStdString();
     }

@@ -17,16 +17,11 @@ class Correction : public CommandLine
 protected:
     Correction() { TagFile::setMetaFolder(path("store/meta").toLocal8Bit().constData()); }
 
-    QString job(const QByteArray& oldStudy, const char* key, const QByteArray& value) const
+    /// Makes the job anew and runs it.
+    Answer correct(const DcmTagKey& key, const QByteArray& value, const QByteArray& oldStudy,
+                   const QByteArray& arguments) const
     {
-        put("job.xml", "<Job><Timestamp>20240131120000</Timestamp><Substitutions OldSUID='" + oldStudy +
-                           "'><Tag " + key + "><Value>" + value + "</Value></Tag></Substitutions></Job>");
-        return file("job.xml");
-    }
-
-    Answer correct(const QString& job, const char* arguments) const
-    {
-        return kdd("qa --json", QStringList{job} + QString::fromLatin1(arguments).split(QLatin1Char(' ')));
+        return kdd("qa --json " + job(key, value, oldStudy) + ' ' + arguments);
     }
 
     /// The images of a tag file.
@@ -39,26 +34,24 @@ protected:
     }
 };
 
-constexpr const char* kPatientName = "Group='0010' Element='0010'";
-constexpr const char* kSeries = "Group='0020' Element='000e'";
-
 TEST_F(Correction, TellsWhatItDid)
 {
     addTwoStudies();
-    const QString edit = job("", kPatientName, "Roe^R");
-    EXPECT_EQ(correct(edit, "--study 1.2 --image 1 2").out,
-              "{\"changed\":2,\"images\":2,\"moved\":0,\"notFound\":0}\n");
-    EXPECT_EQ(correct(edit, "--study 1.2").exitCode, 2) << "no images";
+    const QByteArray edit = "qa --json --study 1.2 " + job(DCM_PatientName, "Roe^R");
+    EXPECT_EQ(kdd(edit + " --image 1 2").out, "{\"changed\":2,\"images\":2,\"moved\":0,\"notFound\":0}\n");
+    EXPECT_EQ(kdd(edit).exitCode, 2) << "no images";
     EXPECT_TRUE(kdd("metadata 1.2 --image 1").out.contains("Roe^R"));
     put("images.txt", "3\n\n 1 \n9\n");
-    const Answer listed =
-        correct(edit, ("--study 1.2 --images " + file("images.txt").toLatin1()).constData());
+    const Answer listed = kdd(edit + " --images @images.txt");
     EXPECT_EQ(listed.out, "{\"changed\":1,\"images\":3,\"moved\":0,\"notFound\":1}\n");
     EXPECT_EQ(listed.exitCode, 1);
     EXPECT_TRUE(listed.err.contains("There is no image 9 in study 1.2"));
-    EXPECT_EQ(correct(job("1.3", kSeries, "1.2.9"), "--study 1.2 --image 4").number("moved"), 1);
-    EXPECT_EQ(imagesOf("1.2"), 4);
-    EXPECT_EQ(correct(file("job.xml"), "--study 1.2 --image 4").exitCode, 0) << "it is done already";
+    for (const int moved : {1, 0}) {
+        const Answer move = correct(DCM_SeriesInstanceUID, "1.2.9", "1.3", "--study 1.2 --image 4");
+        EXPECT_EQ(move.number("moved"), moved);
+        EXPECT_EQ(move.exitCode, 0) << "the second time it is done already";
+        EXPECT_EQ(imagesOf("1.2"), 4);
+    }
 }
 
 TEST_F(Correction, AnImageThatWasReplacedComesBackWhenTheOtherOneMovesOn)
@@ -67,8 +60,8 @@ TEST_F(Correction, AnImageThatWasReplacedComesBackWhenTheOtherOneMovesOn)
     save("5", anImage("4").inStudy("1.2").inSeries("1.2.4").with(DCM_PatientName, "Doe^J"));
     save("6", anImage("6").inStudy("1.3").inSeries("1.3.1"));
     EXPECT_EQ(addImages().exitCode, 0);
-    EXPECT_EQ(correct(job("1.2", kSeries, "1.3.1"), "--study 1.3 --image 4").number("moved"), 1);
-    EXPECT_EQ(correct(job("1.3", kSeries, "1.2.4"), "--study 1.2 --image 4").number("moved"), 1);
+    EXPECT_EQ(correct(DCM_SeriesInstanceUID, "1.3.1", "1.2", "--study 1.3 --image 4").number("moved"), 1);
+    EXPECT_EQ(correct(DCM_SeriesInstanceUID, "1.2.4", "1.3", "--study 1.2 --image 4").number("moved"), 1);
     EXPECT_EQ(listed("--waiting"), "1.3");
     EXPECT_EQ(kdd("build").exitCode, 0);
     EXPECT_EQ(stored("1.3"), (QSet<QByteArray>{"4", "6"}));
@@ -79,17 +72,14 @@ TEST_F(Correction, IsPreviewedWithoutAnyChange)
 {
     addTwoStudies();
     const QByteArray before = kdd("metadata 1.2").out;
-    job("", kPatientName, "Roe^R");
-    const Answer told = kdd("qa @job.xml --study 1.2 --image 1 2 9 --preview");
+    const Answer told = kdd("qa " + job(DCM_PatientName, "Roe^R") + " --study 1.2 --image 1 2 9 --preview");
     EXPECT_EQ(told.out, "2 images:\n  00100010 PatientName: \"Doe^J\" -> \"Roe^R\"\n"
                         "3 images: 2 would be changed, 0 moved, 1 not found\n");
     EXPECT_EQ(told.exitCode, 1);
-    const Answer move = correct(job("1.3", kSeries, "1.2.9"), "--study 1.2 --image 4 --preview");
+    const Answer move = correct(DCM_SeriesInstanceUID, "1.2.9", "1.3", "--study 1.2 --image 4 --preview");
     EXPECT_EQ(move.number("moved"), 1);
-    EXPECT_EQ(move.json("changes")[0][QLatin1String("images")], QJsonArray{QStringLiteral("4")});
-    EXPECT_EQ(
-        correct(job("", "Group='0010' Element='0030'", "soon"), "--study 1.2 --image 1 --preview").exitCode,
-        1);
+    EXPECT_EQ(move.json("changes/0/images"), QJsonArray{QStringLiteral("4")});
+    EXPECT_EQ(correct(DCM_PatientBirthDate, "soon", "", "--study 1.2 --image 1 --preview").exitCode, 1);
     EXPECT_EQ(kdd("metadata 1.2").out, before);
     EXPECT_EQ(imagesOf("1.3"), 1);
 }
@@ -118,7 +108,7 @@ TEST_F(Correction, MovesThatAreKilledAreCompletedByTheNext)
     constexpr int kMoving = 20;
     constexpr int kStaying = 60;
     std::mt19937 random(3);
-    QStringList moving = {QStringLiteral("--compression"), QStringLiteral("lzma"), QStringLiteral("--image")};
+    QByteArray moving = " --compression lzma --image";
     for (int i = 0; i < kMoving + 2 * kStaying; ++i) {
         QByteArray noise;
         while (noise.size() < 900)
@@ -130,25 +120,24 @@ TEST_F(Correction, MovesThatAreKilledAreCompletedByTheNext)
                                   .inSeries((study + (i < kMoving ? ".1" : ".2")).constData())
                                   .with(DCM_ImageComments, noise));
         if (i < kMoving)
-            moving.append(QString::fromLatin1(uid));
+            moving += ' ' + uid;
     }
     EXPECT_EQ(addImages().exitCode, 0);
     unsigned duration = 0;
     for (unsigned round = 0; round < 20; ++round) {
         const char* const from = round % 2 == 0 ? "1.2" : "1.9";
         const char* const to = round % 2 == 0 ? "1.9" : "1.2";
-        const QStringList move = QStringList{job(from, kSeries, to + QByteArray(".1")),
-                                             QStringLiteral("--study"), QString::fromLatin1(to)} +
-                                 moving;
+        const QByteArray move =
+            "qa " + job(DCM_SeriesInstanceUID, to + QByteArray(".1"), from) + " --study " + to + moving;
         QElapsedTimer timer;
         timer.start();
-        const auto killed = start("qa", move);
+        const auto killed = start(move);
         killed->waitForFinished(round == 0 ? kTimeout : static_cast<int>(random() % duration));
         duration = round == 0 ? static_cast<unsigned>(timer.elapsed()) + 1 : duration;
         killed->kill();
         killed->waitForFinished(kTimeout);
         EXPECT_EQ((stored(from) + stored(to)).size(), kMoving + 2 * kStaying);
-        const Answer again = kdd("qa", move);
+        const Answer again = kdd(move);
         EXPECT_EQ(again.exitCode, 0) << again.err.toStdString();
         EXPECT_EQ(stored(from).size(), kStaying);
         EXPECT_EQ(stored(to).size(), kMoving + kStaying);

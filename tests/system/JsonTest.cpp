@@ -9,85 +9,73 @@ namespace
 class Json : public CommandLine
 {
 protected:
-    struct Row
-    {
-        const char* command;
-        int exitCode;
-        bool hasResult = true;
-    };
-
-    Answer run(const char* command) const { return kdd(("--json " + QByteArray(command)).constData()); }
-
-    void expectWhole(const Row& row) const
-    {
-        const Answer answer = run(row.command);
-        QJsonParseError fault;
-        QJsonDocument::fromJson(answer.out, &fault);
-        EXPECT_EQ(answer.exitCode, row.exitCode) << row.command << '\n' << answer.err.toStdString();
-        EXPECT_EQ(answer.out.isEmpty(), !row.hasResult) << row.command << '\n' << answer.out.toStdString();
-        EXPECT_TRUE(!row.hasResult || fault.error == QJsonParseError::NoError) << answer.out.toStdString();
-        EXPECT_EQ(answer.err.isEmpty(), row.exitCode == 0) << row.command << '\n' << answer.err.toStdString();
-    }
+    Answer run(const QByteArray& command) const { return kdd("--json " + command); }
 };
 
 TEST_F(Json, IsWholeOrAbsentWhateverTheCommandComesTo)
 {
-    const Row kRows[] = {
-        {"list", 0},
+    // With the exit code, and whether there is a result all the same.
+    const std::tuple<const char*, int, bool> kRows[] = {
+        {"list", 0, true},
         {"list --date x", 2, false},
-        {"index @1", 0},
-        {"index @1 none", 1},
-        {"add @1", 0},
-        {"add none", 1},
-        {"build --all", 0},
-        {"stack", 0},
-        {"stack 9", 1},
-        {"show 1.2", 0},
-        {"show 1.2 --tree", 0},
+        {"index @1", 0, true},
+        {"index @1 none", 1, true},
+        {"add @1", 0, true},
+        {"add none", 1, true},
+        {"build --all", 0, true},
+        {"stack", 0, true},
+        {"stack 9", 1, true},
+        {"show 1.2", 0, true},
+        {"show 1.2 --tree", 0, true},
         {"show 9 --tree", 1, false},
-        {"metadata 1.2", 0},
+        {"metadata 1.2", 0, true},
         {"metadata 1.2 --image 9", 1, false},
-        {"stat 1.2", 0},
-        {"previews --all @out", 0},
-        {"sync 1.2", 0},
-        {"verify --all", 0},
-        {"verify 9", 1},
-        {"diff 1.2 1.2", 0},
-        {"sample @out --images 1", 0},
+        {"stat 1.2", 0, true},
+        {"previews --all @out", 0, true},
+        {"sync 1.2", 0, true},
+        {"verify --all", 0, true},
+        {"verify 9", 1, true},
+        {"diff 1.2 1.2", 0, true},
+        {"sample @out --images 1", 0, true},
         {"sample /proc/kdd", 1, false},
         {"get http://127.0.0.1:1/x -o @out", 1, false},
         {"put none gs://b/o", 1, false},
-        {"qa @job.xml --study 1.2 --image 1", 0},
-        {"qa @job.xml --study 1.2 --image 9", 1},
+        {"qa @job.xml --study 1.2 --image 1", 0, true},
+        {"qa @job.xml --study 1.2 --image 9", 1, true},
         {"qa none --study 1.2 --image 1", 1, false},
         {"delete 1.2 --image 9", 1, false},
-        {"delete 1.2 --image 1", 0},
+        {"delete 1.2 --image 1", 0, true},
         {"--database sqlite:/proc/none/kdd list", 1, false},
     };
     addTwoStudies();
-    put("job.xml", "<Job><Tag Group='0010' Element='0010'><Value>Roe^R</Value></Tag></Job>");
-    for (const Row& row : kRows)
-        expectWhole(row);
+    put("job.xml", jobXml(DCM_PatientName, "Roe^R"));
+    for (const auto& [command, exitCode, hasResult] : kRows) {
+        const Answer answer = run(command);
+        SCOPED_TRACE((command + QByteArray("\n") + answer.out + answer.err).toStdString());
+        QJsonParseError fault;
+        QJsonDocument::fromJson(answer.out, &fault);
+        EXPECT_EQ(answer.exitCode, exitCode);
+        EXPECT_EQ(answer.out.isEmpty(), !hasResult);
+        EXPECT_TRUE(!hasResult || fault.error == QJsonParseError::NoError);
+        EXPECT_EQ(answer.err.isEmpty(), exitCode == 0);
+    }
 }
 
 TEST_F(Json, ShowsANodeItsOwnEntriesAndTheTree)
 {
     addTwoStudies();
-    const auto shown = [this](const char* command) {
-        return QJsonDocument::fromJson(run(command).out).object();
+    const auto shown = [this](const char* command, const char* place) {
+        return jsonAt(run(command).out, place);
     };
-    const QJsonObject image = shown("show 1.2 --image 1");
-    EXPECT_EQ(image, QJsonDocument::fromJson(run("metadata 1.2 --image 1").out).array().at(0).toObject());
-    EXPECT_TRUE(image.contains(QLatin1String("00100010")));
-    const QJsonObject own = shown("show 1.2 --image 1 --own");
-    EXPECT_TRUE(own.contains(QLatin1String("00080018")));
-    EXPECT_FALSE(own.contains(QLatin1String("00100010"))) << "the study has it";
-    EXPECT_TRUE(shown("show 1.2 --own").contains(QLatin1String("00100010")));
-    const QJsonObject study = shown("show 1.2 --tree");
-    EXPECT_EQ(study.value(QLatin1String("study")), QLatin1String("1.2"));
-    const QJsonValue series = study.value(QLatin1String("children")).toArray().at(1);
-    EXPECT_EQ(series[QLatin1String("series")], QLatin1String("1.2.4"));
-    EXPECT_EQ(series[QLatin1String("children")][1][QLatin1String("image")], QLatin1String("3"));
+    EXPECT_EQ(shown("show 1.2 --image 1", ""), shown("metadata 1.2 --image 1", "0"));
+    EXPECT_TRUE(shown("show 1.2 --image 1", "00100010").isObject());
+    EXPECT_TRUE(shown("show 1.2 --image 1 --own", "00080018").isObject());
+    EXPECT_TRUE(shown("show 1.2 --image 1 --own", "00100010").isUndefined()) << "the study has it";
+    EXPECT_TRUE(shown("show 1.2 --own", "00100010").isObject());
+    const QJsonValue study = shown("show 1.2 --tree", "");
+    EXPECT_EQ(textAt(study, "study"), "1.2");
+    EXPECT_EQ(textAt(study, "children/1/series"), "1.2.4");
+    EXPECT_EQ(textAt(study, "children/1/children/1/image"), "3");
 }
 
 }  // namespace

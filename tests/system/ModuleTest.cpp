@@ -36,12 +36,8 @@ protected:
     }
 };
 
-const struct
-{
-    const char* arguments;
-    int exitCode;
-    const char* module;  // that is missed
-} kUses[] = {
+/// With the exit code and the module that is missed.
+const std::tuple<const char*, int, const char*> kUses[] = {
     {"--version", 0, ""},
     {"stat 1.2 --json", 0, ""},
     {"metadata 1.2", 0, ""},
@@ -53,11 +49,11 @@ const struct
 
 TEST_F(BareTool, ReadsTagFilesAndNamesWhatElseIsMissing)
 {
-    for (const auto& use : kUses) {
-        const Answer answer = run(use.arguments);
-        EXPECT_EQ(answer.exitCode, use.exitCode) << use.arguments << '\n' << answer.err.toStdString();
-        EXPECT_TRUE(answer.err.contains(use.module)) << use.arguments << '\n' << answer.err.toStdString();
-        EXPECT_EQ(answer.err.contains("is not installed in"), use.exitCode != 0) << use.arguments;
+    for (const auto& [arguments, exitCode, module] : kUses) {
+        const Answer answer = run(arguments);
+        EXPECT_EQ(answer.exitCode, exitCode) << arguments << '\n' << answer.err.toStdString();
+        EXPECT_TRUE(answer.err.contains(module)) << arguments << '\n' << answer.err.toStdString();
+        EXPECT_EQ(answer.err.contains("is not installed in"), exitCode != 0) << arguments;
     }
 }
 

@@ -1,5 +1,6 @@
 #include "ServedStore.h"
 #include "kddlib/tagfile/TagFile.h"
+#include "support/Setting.h"
 
 #include <QThread>
 
@@ -12,24 +13,10 @@ namespace
 class Proof : public ServedStore
 {
 protected:
-    void TearDown() override
-    {
-        for (const char* name :
-             {"KDD_FILE_DIGESTS", "KDD_CHECK_RATE", "KDD_CHECK_HEALS", "KDD_SERVER_PROVES"})
-            qunsetenv(name);
-    }
-
     QString tagFile(const char* study) const
     {
         TagFile::setMetaFolder(path("store/meta").toUtf8().constData());
         return TagFile::cacheFilePathForStudy(study);
-    }
-
-    static QByteArray metrics(const QByteArray& address)
-    {
-        Client client(address);
-        client.get("/metrics");
-        return client.reply().body;
     }
 };
 
@@ -71,23 +58,21 @@ TEST_F(Proof, DeepVerifyTellsBitRotOfDicomFiles)
 
 TEST_F(Proof, AServerLooksInTheBackground)
 {
-    qputenv("KDD_FILE_DIGESTS", "1");
+    const Setting digests("KDD_FILE_DIGESTS", "1");
     addTwoStudies();
     EXPECT_EQ(kdd("verify --all --deep --json").number("undigested"), 0);
     flipBit(file("1"), bytes("1").size() - 2);
     flipBit(tagFile("1.3"), 40);
-    qputenv("KDD_CHECK_RATE", "100");
-    qputenv("KDD_CHECK_HEALS", "1");
+    const Setting rate("KDD_CHECK_RATE", "100");
+    const Setting heals("KDD_CHECK_HEALS", "1");
     const auto server = start("--json serve --listen 127.0.0.1:0 --status 127.0.0.1:0");
-    ASSERT_TRUE(server->waitForReadyRead(kTimeout)) << server->readAllStandardError().toStdString();
-    const QJsonObject told = QJsonDocument::fromJson(server->readLine()).object();
-    const QByteArray status = told.value(QLatin1String("status")).toString().toLatin1();
+    const QByteArray status = jsonAt(toldBy(*server), "status").toString().toLatin1();
     QByteArray counted;
     const auto isDone = [&] {
         return counted.contains("kdd_check_studies 2\n") && counted.contains("kdd_check_faulty_studies 1\n");
     };
     for (int look = 0; look < 3000 && !isDone(); ++look) {
-        counted = metrics(status);
+        counted = Client(status).ask("/metrics").body;
         QThread::msleep(10);
     }
     EXPECT_TRUE(counted.contains("kdd_check_faulty_studies 1\n")) << counted.toStdString();
@@ -101,16 +86,12 @@ TEST_F(Proof, AServerLooksInTheBackground)
 
 TEST_F(Proof, AServerThatProvesServesNoWrongPreview)
 {
-    qputenv("KDD_SERVER_PROVES", "1");
+    const Setting proves("KDD_SERVER_PROVES", "1");
     save("1", anImage("1").inStudy("1.2"));
     addImages();
     Addresses addresses;
     const auto server = serve(addresses);
-    const auto status = [&] {
-        Client client(addresses.http);
-        client.get("/dicom-web/studies/1.2/metadata");
-        return client.reply().status;
-    };
+    const auto status = [&] { return Client(addresses.http).ask("/dicom-web/studies/1.2/metadata").status; };
     EXPECT_EQ(status(), 200);
     // Stored without a checksum, as previews are: only the digest tells.
     EXPECT_EQ(kdd("--compression none build --all --again").exitCode, 0);
@@ -127,14 +108,15 @@ TEST_F(Proof, AServerThatProvesServesNoWrongPreview)
 
 TEST_F(Proof, ObjectsThatArriveAreDigestedAsTheyPass)
 {
-    qputenv("KDD_FILE_DIGESTS", "1");
     save("1", anImage("1").inStudy("1.2"));
-    Addresses addresses;
-    const auto server = serve(addresses);
-    EXPECT_EQ(send(addresses, bytes("1")), 200);
-    server->terminate();
-    EXPECT_EQ(finish(*server).exitCode, 0);
-    qunsetenv("KDD_FILE_DIGESTS");
+    {
+        const Setting digests("KDD_FILE_DIGESTS", "1");
+        Addresses addresses;
+        const auto server = serve(addresses);
+        EXPECT_EQ(send(addresses, bytes("1")), 200);
+        server->terminate();
+        EXPECT_EQ(finish(*server).exitCode, 0);
+    }
     const Answer deep = kdd("verify --all --deep --json");
     EXPECT_EQ(deep.exitCode, 0) << deep.err.toStdString();
     EXPECT_EQ(deep.number("files"), 1);

@@ -36,27 +36,22 @@ TEST_F(Put, LeavesNoObjectWhenItFailsAndNamesTheReasonOnce)
 {
     put("file", "bytes");
     const CloudStore::Fault forbidden = {0, "403 Forbidden"};
-    struct
-    {
-        QString path;
-        const char* url;
-        int exitCode;
-        const char* reason;
-        std::vector<CloudStore::Fault> faults = {};
-    } const kCases[] = {
-        {file("absent"), "gs://b/o", 1, "/absent: No such file"},
-        {images(), "gs://b/o", 1, "/images: "},
-        {file("file"), "https://a/b", 2, "https://a/b names no object of the cloud storage"},
-        {file("file"), "gs://b", 2, "gs://b names no object"},
-        {file("file"), "gs://b/o?x", 2, "gs://b/o?x has a \"?\""},
+    using Faults = std::vector<CloudStore::Fault>;
+    const QString mem = QStringLiteral("/proc/self/mem");
+    const std::tuple<QString, const char*, int, const char*, Faults> kCases[] = {
+        {file("absent"), "gs://b/o", 1, "/absent: No such file", {}},
+        {images(), "gs://b/o", 1, "/images: ", {}},
+        {file("file"), "https://a/b", 2, "https://a/b names no object of the cloud storage", {}},
+        {file("file"), "gs://b", 2, "gs://b names no object", {}},
+        {file("file"), "gs://b/o?x", 2, "gs://b/o?x has a \"?\"", {}},
         {file("file"), "gs://b/o", 1, "/file was not uploaded to gs://b/o: HTTP code 403", {forbidden}},
         {file("file"), "gs://b/o", 1, "/file was not uploaded to gs://b/o: HTTP code 403", {{}, forbidden}},
-        {QStringLiteral("/proc/self/mem"), "gs://b/o", 1, "/proc/self/mem was not uploaded to gs://b/o: "}};
-    for (const auto& one : kCases) {
-        store.misbehave(one.faults);
-        const Answer answer = upload(one.path, one.url);
-        EXPECT_EQ(answer.exitCode, one.exitCode);
-        EXPECT_EQ(answer.err.count(one.reason), 1) << answer.err.toStdString();
+        {mem, "gs://b/o", 1, "/proc/self/mem was not uploaded to gs://b/o: ", {}}};
+    for (const auto& [from, url, exitCode, reason, faults] : kCases) {
+        store.misbehave(faults);
+        const Answer answer = upload(from, url);
+        EXPECT_EQ(answer.exitCode, exitCode) << reason;
+        EXPECT_EQ(answer.err.count(reason), 1) << answer.err.toStdString();
     }
     EXPECT_TRUE(store.object("b/o").isNull());
 }

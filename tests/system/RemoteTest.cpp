@@ -43,9 +43,9 @@ protected:
 
     void writeList() const { putFile(path("list"), mUrls.join(QLatin1Char('\n')).toUtf8() + "\n\n"); }
 
-    Answer addList(const char* command = "add --json") const
+    Answer addList(const QByteArray& command = "add --json") const
     {
-        return kdd(command, {QStringLiteral("--from"), path("list")});
+        return kdd(command + " --from " + path("list").toUtf8());
     }
 
     /// All that a store has of a study but where its files lie.
@@ -63,14 +63,14 @@ protected:
     void expectServed() const
     {
         const std::unique_ptr<QProcess> server = start("--json serve --listen 127.0.0.1:0");
-        ASSERT_TRUE(server->waitForReadyRead(kTimeout));
-        const QJsonObject told = QJsonDocument::fromJson(server->readLine()).object();
-        Client client(told.value(QLatin1String("address")).toString().toLatin1());
-        client.get("/dicom-web/studies/1.2/metadata");
-        EXPECT_EQ(QJsonDocument::fromJson(client.reply().body).array().size(), 4);
-        client.get("/dicom-web/studies/1.2/series/1.2.5/instances/5/frames/1",
-                   "Accept: application/octet-stream\r\n");
-        EXPECT_EQ(client.reply().body, QByteArray("\1\0\2\0\3\0\4\0", 8));
+        Client client(jsonAt(toldBy(*server), "address").toString().toLatin1());
+        EXPECT_EQ(QJsonDocument::fromJson(client.ask("/dicom-web/studies/1.2/metadata").body).array().size(),
+                  4);
+        EXPECT_EQ(client
+                      .ask("/dicom-web/studies/1.2/series/1.2.5/instances/5/frames/1",
+                           "Accept: application/octet-stream\r\n")
+                      .body,
+                  QByteArray("\1\0\2\0\3\0\4\0", 8));
         server->terminate();
         EXPECT_EQ(finish(*server).exitCode, 0);
     }
@@ -99,13 +99,12 @@ TEST_F(Remote, StudiesAreWhatTheyAreFromLocalFiles)
     EXPECT_EQ(added.exitCode, 0) << added.err.toStdString();
     EXPECT_EQ(added.number("skipped"), 0);
     EXPECT_EQ(kdd("verify --all --json").exitCode, 0);
-    const QJsonArray list =
-        QJsonDocument::fromJson(studies).object().value(QLatin1String("studies")).toArray();
+    const QJsonArray list = jsonAt(studies, "studies").toArray();
     ASSERT_GT(list.size(), 3);
     const auto expectSame = [&](const char* when) {
         for (const QJsonValue& study : list) {
-            const QByteArray uid = study.toObject().value(QLatin1String("study")).toString().toLatin1();
-            EXPECT_EQ(shown("store", uid.constData()), shown("local", uid.constData())) << when;
+            const std::string uid = textAt(study, "study");
+            EXPECT_EQ(shown("store", uid.c_str()), shown("local", uid.c_str())) << when;
         }
     };
     expectSame("merged or built as they came");
@@ -171,12 +170,8 @@ TEST_F(Remote, StudiesOfLocalAndRemoteImagesAreCorrectedDeletedAndServed)
     mServer.addFile("5", bytes("5"));
     EXPECT_EQ(kdd("add --json", {urlOf("5")}).number("images"), 4) << "merged";
     EXPECT_EQ(kdd("verify --all").exitCode, 0);
-    put("job.xml", "<Job><Timestamp>20240131120000</Timestamp><Substitutions OldSUID=''><Tag Group='0010'"
-                   " Element='0010'><Value>Roe^R</Value></Tag></Substitutions></Job>");
-    EXPECT_EQ(kdd("qa --json", {file("job.xml"), QStringLiteral("--study"), QStringLiteral("1.2"),
-                                QStringLiteral("--image"), QStringLiteral("2"), QStringLiteral("5")})
-                  .number("changed"),
-              2);
+    const QByteArray edit = "qa --json " + job(DCM_PatientName, "Roe^R");
+    EXPECT_EQ(kdd(edit + " --study 1.2 --image 2 5").number("changed"), 2);
     EXPECT_EQ(kdd("sync 1.2").exitCode, 0);
     EXPECT_EQ(kdd("delete 1.2 --image 2").exitCode, 0);
     EXPECT_EQ(imagesOf("1.2"), 3);

@@ -33,13 +33,10 @@ protected:
         EXPECT_EQ(kdd("build --settle").exitCode, 0);
     }
 
-    void correct(const char* image) const
+    void correct(const QByteArray& image) const
     {
-        putFile(path("job.xml"),
-                "<Job><Timestamp>20240131120000</Timestamp><Login>anna</Login><Substitutions>"
-                "<Tag Group=\"0010\" Element=\"0010\"><Value>Roe^R</Value></Tag>"
-                "</Substitutions></Job>");
-        EXPECT_EQ(kdd("qa --study 1.2 --image", {QString::fromLatin1(image), path("job.xml")}).exitCode, 0);
+        const QByteArray edit = "qa " + job(DCM_PatientName, "Roe^R");
+        EXPECT_EQ(kdd(edit + " --study 1.2 --image " + image).exitCode, 0);
     }
 
     void copy(const char* from, const char* to) const
@@ -47,32 +44,25 @@ protected:
         EXPECT_EQ(QProcess::execute(QStringLiteral("cp"), {QStringLiteral("-a"), path(from), path(to)}), 0);
     }
 
-    void bringBack(const char* part) const
+    void bringBack(const QByteArray& part) const
     {
-        const QByteArray place = QByteArray("store/") + part;
-        const QByteArray kept = QByteArray("backup/") + part;
         drop(part);
-        copy(kept.constData(), place.constData());
+        copy("backup/" + part, "store/" + part);
     }
 
-    void drop(const char* part) const
+    void drop(const QByteArray& part) const
     {
-        const QByteArray place = QByteArray("store/") + part;
-        QDir(path(place.constData())).removeRecursively();
-        QFile::remove(path(place.constData()));
+        QDir(path("store/" + part)).removeRecursively();
+        QFile::remove(path("store/" + part));
     }
 
     /// What the metadata say of each image, by the last component of its UID.
     QMap<QByteArray, QByteArray> patients() const
     {
         QMap<QByteArray, QByteArray> found;
-        for (const QJsonValue& image : QJsonDocument::fromJson(kdd("metadata 1.2").out).array()) {
-            const auto value = [&](const char* key) {
-                return image[QLatin1String(key)][QLatin1String("Value")][0];
-            };
-            found.insert(value("00080018").toString().toLatin1().mid(6),
-                         value("00100010")[QLatin1String("Alphabetic")].toString().toUtf8());
-        }
+        for (const QJsonValue& image : jsonAt(kdd("metadata 1.2").out).toArray())
+            found.insert(jsonAt(image, "00080018/Value/0").toString().toLatin1().mid(6),
+                         jsonAt(image, "00100010/Value/0/Alphabetic").toString().toUtf8());
         return found;
     }
 };

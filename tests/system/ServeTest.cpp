@@ -5,18 +5,14 @@ using namespace Kdd;
 namespace
 {
 
-class Serve : public CommandLine
-{
-};
+using Serve = CommandLine;
 
 TEST_F(Serve, TellsItsAddressesAndEndsWhenItIsAsked)
 {
     const auto process = start("--json serve --listen [::1]:0 --status 127.0.0.1:0 --threads 1");
-    ASSERT_TRUE(process->waitForReadyRead(kTimeout)) << process->readAllStandardError().toStdString();
-    const QJsonObject told = QJsonDocument::fromJson(process->readLine()).object();
-    EXPECT_TRUE(told.value(QLatin1String("address")).toString().startsWith(QLatin1String("http://[::1]:")));
-    EXPECT_TRUE(
-        told.value(QLatin1String("status")).toString().startsWith(QLatin1String("http://127.0.0.1:")));
+    const QByteArray told = toldBy(*process);
+    EXPECT_EQ(textAt(told, "address").rfind("http://[::1]:", 0), 0U) << told.toStdString();
+    EXPECT_EQ(textAt(told, "status").rfind("http://127.0.0.1:", 0), 0U) << told.toStdString();
     process->terminate();
     EXPECT_EQ(finish(*process).exitCode, 0);
 }
@@ -24,9 +20,7 @@ TEST_F(Serve, TellsItsAddressesAndEndsWhenItIsAsked)
 TEST_F(Serve, ReceivesWithoutRequestsWhenThatIsAskedFor)
 {
     const auto process = start("--json receive 127.0.0.1:0");
-    ASSERT_TRUE(process->waitForReadyRead(kTimeout)) << process->readAllStandardError().toStdString();
-    const QString address =
-        QJsonDocument::fromJson(process->readLine()).object().value(QLatin1String("dicom")).toString();
+    const QString address = jsonAt(toldBy(*process), "dicom").toString();
     save("1", anImage("1"));
     QProcess sender;
     sender.start(QStringLiteral("storescu"),
@@ -40,12 +34,7 @@ TEST_F(Serve, ReceivesWithoutRequestsWhenThatIsAskedFor)
 
 TEST_F(Serve, SaysWhyItDoesNotBegin)
 {
-    const struct
-    {
-        const char* arguments;
-        int exitCode;
-        const char* reason;
-    } kRefusals[] = {
+    const std::tuple<const char*, int, const char*> kRefusals[] = {
         {"serve --listen 8042", 2, "\"8042\" is no address to listen at"},
         {"serve --listen 0.0.0.0:0", 1, "0.0.0.0:0 can be reached by other machines"},
         {"serve --access none.json", 2, "The access file cannot be followed: none.json: "},
@@ -59,10 +48,10 @@ TEST_F(Serve, SaysWhyItDoesNotBegin)
         {"receive 0 --title SEVENTEEN-LETTERS", 2, "\"SEVENTEEN-LETTERS\" is no application entity title"},
         {"receive 0 --peers none.json", 2, "The peers file cannot be followed: none.json: "},
     };
-    for (const auto& refusal : kRefusals) {
-        const Answer answer = kdd(refusal.arguments);
-        EXPECT_EQ(answer.exitCode, refusal.exitCode) << refusal.arguments;
-        EXPECT_TRUE(answer.err.contains(refusal.reason)) << answer.err.toStdString();
+    for (const auto& [arguments, exitCode, reason] : kRefusals) {
+        const Answer answer = kdd(arguments);
+        EXPECT_EQ(answer.exitCode, exitCode) << arguments;
+        EXPECT_TRUE(answer.err.contains(reason)) << answer.err.toStdString();
         EXPECT_EQ(answer.out, "");
     }
 }

@@ -19,10 +19,9 @@ protected:
     std::unique_ptr<QProcess> serve(Addresses& addresses) const
     {
         auto process = start("--json serve --stow --listen 127.0.0.1:0 --dicom 0");
-        EXPECT_TRUE(process->waitForReadyRead(kTimeout)) << process->readAllStandardError().toStdString();
-        const QJsonObject told = QJsonDocument::fromJson(process->readLine()).object();
-        addresses.http = told.value(QLatin1String("address")).toString().toLatin1();
-        addresses.dicom = told.value(QLatin1String("dicom")).toString().toLatin1();
+        const QByteArray told = toldBy(*process);
+        addresses.http = jsonAt(told, "address").toString().toLatin1();
+        addresses.dicom = jsonAt(told, "dicom").toString().toLatin1();
         return process;
     }
 

@@ -62,8 +62,7 @@ protected:
     }
 };
 
-INSTANTIATE_TEST_SUITE_P(Engines, DatabaseFailureTest, testing::Values(Engine::Sqlite, Engine::Postgres),
-                         engineName);
+INSTANTIATE_TEST_SUITE_P(Engines, DatabaseFailureTest, kBothEngines, engineName);
 
 TEST_P(DatabaseFailureTest, TablesThatAreMissingOrOfANewerProgramAreRefused)
 {

@@ -4,21 +4,18 @@
 #include "platform/database/DatabaseAddress.h"
 #include "platform/database/Kxg.h"
 #include "platform/database/SqlConnection.h"
-#include "support/PostgresServer.h"
+#include "support/Engines.h"
 
 #include <QTemporaryDir>
 
 #include <gtest/gtest.h>
 
-using Engine = Kxg::DatabaseAddress::Engine;
+using Kdd::Engine;
+using Kdd::engineName;
+using Kdd::kBothEngines;
 
-inline std::string engineName(const testing::TestParamInfo<Engine>& engine)
-{
-    return engine.param == Engine::Sqlite ? "Sqlite" : "Postgres";
-}
-
-inline Kxg::DicomFileRecord dicom(const char* path, const char* study, const char* series,
-                                  const char* sop = "1")
+inline Kxg::DicomFileRecord dicom(const QByteArray& path, const QByteArray& study, const QByteArray& series,
+                                  const QByteArray& sop = "1")
 {
     Kxg::DicomFileRecord file;
     file.path = path;
@@ -36,8 +33,7 @@ protected:
 
     void SetUp() override
     {
-        mAddress = GetParam() == Engine::Sqlite ? "sqlite:" + mFolder.path().toUtf8() + "/made/catalogue.db"
-                                                : Kdd::newPostgresDatabase();
+        mAddress = Kdd::newDatabase(GetParam(), mFolder.filePath(QStringLiteral("made/catalogue.db")));
         Kxg::SetDatabaseServer(mAddress);
     }
 
@@ -95,11 +91,22 @@ protected:
         return claim;
     }
 
-    void execute(const char* sql) const
+    Kxg::DatabaseAddress parsedAddress() const
     {
         Kxg::DatabaseAddress parsed;
-        ASSERT_TRUE(Kxg::DatabaseAddress::parse(mAddress, parsed).good());
-        Kxg::SqlConnection(parsed, Kxg::SqlConnection::IfAbsent::Create).execute(QString::fromUtf8(sql));
+        EXPECT_TRUE(Kxg::DatabaseAddress::parse(mAddress, parsed).good());
+        return parsed;
+    }
+
+    void execute(const QByteArray& sql) const
+    {
+        Kxg::SqlConnection(parsedAddress(), Kxg::SqlConnection::IfAbsent::Create)
+            .execute(QString::fromUtf8(sql));
+    }
+    void execute(std::initializer_list<const char*> statements) const
+    {
+        for (const char* sql : statements)
+            execute(QByteArray(sql));
     }
 
 private:

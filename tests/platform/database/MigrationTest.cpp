@@ -42,11 +42,20 @@ protected:
     /// Back to the schema before files were known by digests.
     void forgetProofs() const
     {
-        for (const char* backwards :
-             {"DROP TABLE former_tag_file", "DROP INDEX study_by_check", "DROP INDEX study_with_faults",
-              "ALTER TABLE study DROP COLUMN checked", "ALTER TABLE study DROP COLUMN check_faults",
-              "ALTER TABLE study DROP COLUMN check_position", "ALTER TABLE file DROP COLUMN digest"})
-            execute(backwards);
+        execute({"DROP TABLE former_tag_file", "DROP INDEX study_by_check", "DROP INDEX study_with_faults",
+                 "ALTER TABLE study DROP COLUMN checked", "ALTER TABLE study DROP COLUMN check_faults",
+                 "ALTER TABLE study DROP COLUMN check_position", "ALTER TABLE file DROP COLUMN digest"});
+    }
+
+    /// And to that before searches.
+    void forgetSearches() const
+    {
+        forgetProofs();
+        execute({"DROP TABLE forgotten_file", "DROP TABLE change", "DROP TABLE series_request",
+                 "DROP TABLE series_search", "DROP TABLE study_modality", "DROP TABLE IF EXISTS study_parts",
+                 "DROP TABLE study_words", "DROP TABLE study_answer", "DROP TABLE study_search",
+                 "ALTER TABLE build_request DROP COLUMN adds",
+                 "ALTER TABLE build_request DROP COLUMN since"});
     }
 
     void makeFirstTables() const
@@ -59,13 +68,12 @@ protected:
                                  : QStringLiteral("BIGINT GENERATED ALWAYS AS IDENTITY PRIMARY KEY"));
             sql.replace(QLatin1String("{bytes}"),
                         isSqlite ? QStringLiteral("BLOB") : QStringLiteral("BYTEA"));
-            execute(sql.toUtf8().constData());
+            execute(sql.toUtf8());
         }
     }
 };
 
-INSTANTIATE_TEST_SUITE_P(Engines, MigrationTest, testing::Values(Engine::Sqlite, Engine::Postgres),
-                         engineName);
+INSTANTIATE_TEST_SUITE_P(Engines, MigrationTest, kBothEngines, engineName);
 
 TEST_P(MigrationTest, ADatabaseOfTheFirstReleaseKeepsAllThatItKnows)
 {
@@ -90,15 +98,9 @@ TEST_P(MigrationTest, ADatabaseOfTheSecondSchemaKnowsWhichFilesACorrectionMoved)
 {
     add({dicom("/d/a", "1", "1.1", "x"), dicom("/d/b", "1", "1.1", "")});
     correct({{"1", "x", "2", "2.1", "y", "changes"}, {"1", "/d/b", "2", "2.1", "/d/b", "changes"}});
-    forgetProofs();
-    for (const char* backwards :
-         {"DROP TABLE forgotten_file", "DROP TABLE change", "DROP TABLE series_request",
-          "DROP TABLE series_search", "DROP TABLE study_modality", "DROP TABLE IF EXISTS study_parts",
-          "DROP TABLE study_words", "DROP TABLE study_answer", "DROP TABLE study_search",
-          "DROP INDEX file_of_correction", "ALTER TABLE build_request DROP COLUMN adds",
-          "ALTER TABLE build_request DROP COLUMN since", "ALTER TABLE file DROP COLUMN correction_id",
-          "UPDATE schema_version SET version = 2"})
-        execute(backwards);
+    forgetSearches();
+    execute({"DROP INDEX file_of_correction", "ALTER TABLE file DROP COLUMN correction_id",
+             "UPDATE schema_version SET version = 2"});
     open();  // and bring it up to date
     correct({{"1", "x", "1", "1.1", "x", ""}, {"1", "/d/b", "1", "1.1", "/d/b", ""}});
     EXPECT_EQ(studies(), "1   1/2/0*\n");
@@ -111,14 +113,8 @@ TEST_P(MigrationTest, ADatabaseOfTheThirdSchemaIsFoundBySearchesOnceItIsPrepared
     file.patientName = "Müller^Eva";
     file.modality = "CT";
     add({file});
-    forgetProofs();
-    for (const char* backwards :
-         {"DROP TABLE forgotten_file", "DROP TABLE change", "DROP TABLE series_request",
-          "DROP TABLE series_search", "DROP TABLE study_modality", "DROP TABLE IF EXISTS study_parts",
-          "DROP TABLE study_words", "DROP TABLE study_answer", "DROP TABLE study_search",
-          "ALTER TABLE build_request DROP COLUMN adds", "ALTER TABLE build_request DROP COLUMN since",
-          "UPDATE schema_version SET version = 3"})
-        execute(backwards);
+    forgetSearches();
+    execute("UPDATE schema_version SET version = 3");
     Kdd::Result result;
     const auto search = StudySearch::open(address(), result);
     ASSERT_EQ(result.text().toStdString(), "");
@@ -161,24 +157,17 @@ TEST_P(MigrationTest, ADatabaseOfTheFifthSchemaGetsTheIndexesOfNames)
     for (quint32 i = 1; name.size() < 8000; i = i * 1664525 + 1013904223)
         name += QByteArray::number(i, 36);
     forgetProofs();
-    for (const QByteArray& backwards :
-         {QByteArray("DROP INDEX study_search_by_date"),
-          QByteArray(
-              "CREATE INDEX study_search_by_date ON study_search (study_date DESC, study_time DESC, uid)"),
-          QByteArray("DROP INDEX study_modality_by_date"),
-          QByteArray("ALTER TABLE study_modality DROP COLUMN name_words"),
-          QByteArray("ALTER TABLE study_modality DROP COLUMN marks"),
-          QByteArray("ALTER TABLE study_search DROP COLUMN marks"),
-          QByteArray("CREATE INDEX study_modality_by_date ON study_modality (modality, study_date DESC)"),
-          "UPDATE study_search SET name_words = '" + name + "'"})
-        execute(backwards.constData());
+    execute({"DROP INDEX study_search_by_date",
+             "CREATE INDEX study_search_by_date ON study_search (study_date DESC, study_time DESC, uid)",
+             "DROP INDEX study_modality_by_date", "ALTER TABLE study_modality DROP COLUMN name_words",
+             "ALTER TABLE study_modality DROP COLUMN marks", "ALTER TABLE study_search DROP COLUMN marks",
+             "CREATE INDEX study_modality_by_date ON study_modality (modality, study_date DESC)"});
+    execute("UPDATE study_search SET name_words = '" + name + "'");
     if (GetParam() == Engine::Postgres)
         execute("ALTER TABLE study_search ALTER COLUMN name_words SET STATISTICS -1");
     execute("UPDATE schema_version SET version = 5");
     open();
-    DatabaseAddress parsed;
-    ASSERT_TRUE(DatabaseAddress::parse(address(), parsed).good());
-    SqlConnection connection(parsed, SqlConnection::IfAbsent::Fail);
+    SqlConnection connection(parsedAddress(), SqlConnection::IfAbsent::Fail);
     const auto number = [&](const char* question) {
         SqlRows rows = connection.askOnce(question, {});
         return rows.next() ? rows.number(0) : -1;

@@ -58,7 +58,7 @@ protected:
     }
 };
 
-INSTANTIATE_TEST_SUITE_P(Engines, ProofsTest, testing::Values(Engine::Sqlite, Engine::Postgres), engineName);
+INSTANTIATE_TEST_SUITE_P(Engines, ProofsTest, kBothEngines, engineName);
 
 TEST_P(ProofsTest, FormerTagFilesAreKeptUpToABound)
 {

@@ -16,10 +16,8 @@ class QueueNoticesTest : public DatabaseTest
 protected:
     std::unique_ptr<QueueNotices> listen()
     {
-        DatabaseAddress parsed;
-        EXPECT_TRUE(DatabaseAddress::parse(address(), parsed).good());
         Kdd::Result result;
-        auto notices = QueueNotices::open(parsed, mStop, result);
+        auto notices = QueueNotices::open(parsedAddress(), mStop, result);
         EXPECT_EQ(result.text().toStdString(), "");
         return notices;
     }

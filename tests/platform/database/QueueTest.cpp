@@ -15,7 +15,7 @@ protected:
     {
         for (int i = 1; i <= count; ++i) {
             const QByteArray uid = QByteArray::number(i);
-            add({dicom(("/d/" + uid).constData(), uid.constData(), "1")});
+            add({dicom("/d/" + uid, uid, "1")});
         }
     }
 
@@ -27,7 +27,7 @@ protected:
     }
 };
 
-INSTANTIATE_TEST_SUITE_P(Engines, QueueTest, testing::Values(Engine::Sqlite, Engine::Postgres), engineName);
+INSTANTIATE_TEST_SUITE_P(Engines, QueueTest, kBothEngines, engineName);
 
 TEST_P(QueueTest, TheLongestWaitingFreeStudyIsNext)
 {

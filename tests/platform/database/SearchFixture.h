@@ -30,32 +30,19 @@ inline StudySearchRecord aStudy(const char* name, const char* date, const char* 
 
 inline SearchTerm oneOf(SearchColumn column, QVector<QByteArray> values)
 {
-    SearchTerm term;
-    term.column = column;
-    term.values = std::move(values);
-    return term;
+    return {column, std::move(values), {}, {}, {}, {}, {}};
 }
 
 inline SearchTerm like(SearchColumn column, const char* name)
 {
-    SearchTerm term;
-    term.column = column;
-    term.patterns = (column == SearchColumn::PatientName ? namePatterns(QString::fromUtf8(name))
-                                                         : textPatterns(QString::fromUtf8(name)))
-                        .patterns;
-    return term;
+    const auto patternsOf = column == SearchColumn::PatientName ? namePatterns : textPatterns;
+    return {column, {}, patternsOf(QString::fromUtf8(name)).patterns, {}, {}, {}, {}};
 }
 
 inline SearchTerm between(SearchColumn column, const char* from, const char* to, const char* fromTime = "",
                           const char* toTime = "")
 {
-    SearchTerm term;
-    term.column = column;
-    term.from = from;
-    term.to = to;
-    term.fromTime = fromTime;
-    term.toTime = toTime;
-    return term;
+    return {column, {}, {}, from, to, fromTime, toTime};
 }
 
 /// Studies as builds leave them, and what is found of them.
@@ -64,8 +51,7 @@ class SearchTest : public DatabaseTest
 protected:
     void build(const char* uid, const StudySearchRecord& study, const char* digest = "d")
     {
-        add({dicom(QByteArray("/d/" + QByteArray(uid)).constData(), uid, QByteArray(uid + QByteArray(".1")),
-                   uid)});
+        add({dicom(QByteArray("/d/") + uid, uid, QByteArray(uid) + ".1", uid)});
         finish(uid, study, digest);
     }
 

@@ -18,9 +18,7 @@ protected:
     void arrive(int count)
     {
         catalogue();
-        DatabaseAddress parsed;
-        ASSERT_TRUE(DatabaseAddress::parse(address(), parsed).good());
-        SqlConnection connection(parsed, SqlConnection::IfAbsent::Fail);
+        SqlConnection connection(parsedAddress(), SqlConnection::IfAbsent::Fail);
         connection.transact(SqlConnection::Access::Write, [&] {
             for (int i = 0; i < count; ++i) {
                 const QByteArray uid = QByteArray::number(++mArrived);
@@ -37,8 +35,7 @@ private:
     int mArrived = 0;
 };
 
-INSTANTIATE_TEST_SUITE_P(Engines, StudyChangesTest, testing::Values(Engine::Sqlite, Engine::Postgres),
-                         engineName);
+INSTANTIATE_TEST_SUITE_P(Engines, StudyChangesTest, kBothEngines, engineName);
 
 TEST_P(StudyChangesTest, GoesPastChangesThatMayNotBeSeen)
 {
@@ -81,9 +78,8 @@ TEST_P(StudyChangesTest, WhoFollowsTheChangesMissesNone)
     constexpr int kWriters = 4;
     constexpr int kStudies = 10;
     if (GetParam() == Engine::Postgres)
-        execute(("ALTER DATABASE " + address().mid(address().lastIndexOf("@/") + 2).split('?').front() +
-                 " SET default_transaction_isolation = 'repeatable read'")
-                    .constData());
+        execute("ALTER DATABASE " + address().mid(address().lastIndexOf("@/") + 2).split('?').front() +
+                " SET default_transaction_isolation = 'repeatable read'");
     catalogue();
     std::atomic<int> writing{kWriters};
     qint64 last = 0;
@@ -94,12 +90,7 @@ TEST_P(StudyChangesTest, WhoFollowsTheChangesMissesNone)
         for (int i = 0; i < kStudies && thread < kWriters; ++i) {
             const QByteArray uid = QByteArray::number(thread) + '.' + QByteArray::number(i);
             QMap<QByteArray, qint64> requests;
-            EXPECT_TRUE(
-                writer
-                    ->registerFiles(
-                        {{dicom(uid.constData(), uid.constData(), uid.constData(), uid.constData())}, {}, {}},
-                        requests)
-                    .good());
+            EXPECT_TRUE(writer->registerFiles({{dicom(uid, uid, uid, uid)}, {}, {}}, requests).good());
             std::unique_ptr<StudyClaim> claim;
             EXPECT_TRUE(writer->claim(uid, 0, claim, Catalogue::IfAbsent::Fail).good());
             BuiltStudy built;
@@ -132,27 +123,24 @@ TEST_P(StudyChangesTest, ThousandThatCameBetweenTwoRequestsAreToldOnceEachPageBy
     std::vector<StudyChangeNote> page;
     ASSERT_TRUE(search().changes(0, 100, page, last).good());
     arrive(1000);
-    struct Row
-    {
-        int page, seen;  // of so many studies one
-    };
-    for (const Row& row : {Row{100, 1}, Row{7, 1}, Row{5000, 1}, Row{100, 7}, Row{1, 300}, Row{100, 2000}}) {
+    // So many on a page, and of so many studies one may be seen.
+    for (const auto& [size, seen] : {std::pair(100, 1), {7, 1}, {5000, 1}, {100, 7}, {1, 300}, {100, 2000}}) {
         StudyLimit limit{StudyLimit::Of::Uid, "0020000D", {}};
-        for (int uid = row.seen; uid < 2000; uid += row.seen)
+        for (int uid = seen; uid < 2000; uid += seen)
             limit.values << QByteArray::number(uid);
-        search().limitTo(row.seen == 1 ? nullptr : std::make_shared<StudyLimits>(StudyLimits{{limit}}));
-        qint64 expected = 10 - 10 % row.seen;
+        search().limitTo(seen == 1 ? nullptr : std::make_shared<StudyLimits>(StudyLimits{{limit}}));
+        qint64 expected = 10 - 10 % seen;
         bool isFirst = true;
         for (qint64 position = last; position < arrived(); isFirst = false) {
-            ASSERT_TRUE(search().changes(position, row.page, page, position).good());
-            ASSERT_LE(page.size(), static_cast<std::size_t>(row.page));
+            ASSERT_TRUE(search().changes(position, size, page, position).good());
+            ASSERT_LE(page.size(), static_cast<std::size_t>(size));
             for (const StudyChangeNote& change : page)
-                EXPECT_EQ(change.studyInstanceUID.toLongLong(), expected += row.seen);
+                EXPECT_EQ(change.studyInstanceUID.toLongLong(), expected += seen);
             EXPECT_GE(position, page.empty() ? arrived() : page.back().position);
             if (isFirst)
                 arrive(1);
         }
-        EXPECT_EQ(expected, arrived() - arrived() % row.seen);
+        EXPECT_EQ(expected, arrived() - arrived() % seen);
     }
 }
 

@@ -7,8 +7,7 @@ namespace
 
 using StudySearchTest = SearchTest;
 
-INSTANTIATE_TEST_SUITE_P(Engines, StudySearchTest, testing::Values(Engine::Sqlite, Engine::Postgres),
-                         engineName);
+INSTANTIATE_TEST_SUITE_P(Engines, StudySearchTest, kBothEngines, engineName);
 
 TEST_P(StudySearchTest, FindsByEachColumn)
 {
@@ -100,11 +99,7 @@ TEST_P(StudySearchTest, FindsNothingBeyondItsLimits)
         build(uid.constData(), study);
     }
     using Of = StudyLimit::Of;
-    const struct
-    {
-        std::vector<StudyLimit> all;
-        const char* studies;
-    } kLimits[] = {
+    const std::tuple<std::vector<StudyLimit>, const char*> kLimits[] = {
         {{{Of::Series, "00080080", {north}}}, "0 1"},
         {{{Of::Series, "00080080", {"00080080{\"Value\":[\"x\"],\"vr\":\"LO\"}", north, south}}}, "0 1 2 4"},
         {{{Of::Study, "00100020", {R"(00100020{"Value":["P\n00080080"],"vr":"LO"})"}}}, "3"},
@@ -113,9 +108,9 @@ TEST_P(StudySearchTest, FindsNothingBeyondItsLimits)
         {{{Of::Uid, "0020000D", {}}}, ""},
         {{{Of::Series, "00080080", {"%"}}}, ""},
     };
-    for (const auto& each : kLimits) {
-        search().limitTo(std::make_shared<StudyLimits>(StudyLimits{each.all}));
-        const std::string expected = each.studies;
+    for (const auto& [all, studies] : kLimits) {
+        search().limitTo(std::make_shared<StudyLimits>(StudyLimits{all}));
+        const std::string expected = studies;
         EXPECT_EQ(find({}), expected);
         EXPECT_EQ(find({oneOf(SearchColumn::ModalitiesInStudy, {"CT"})}), expected);
         EXPECT_EQ(find({oneOf(SearchColumn::Modality, {"SR"})}), expected);
@@ -182,24 +177,18 @@ TEST_P(StudySearchTest, WhatIsBehindAPageIsCountedAlong)
 {
     for (const char* uid : {"1", "2", "3", "4", "5"})
         build(uid, aStudy("A", "20240101", uid, {"CT"}));
-    struct Row
-    {
-        int offset, limit, counted, found, behind;
-    };
-    for (const Row& row : {Row{0, 2, 9, 2, 3}, Row{1, 2, 1, 2, 1}, Row{3, 2, 9, 2, 0}, Row{0, 0, 9, 0, 5}}) {
-        SearchQuery query;
-        query.offset = row.offset;
-        query.limit = row.limit;
-        query.counted = row.counted;
+    const std::tuple<int, int, int, std::size_t, int> kPages[] = {
+        {0, 2, 9, 2, 3}, {1, 2, 1, 2, 1}, {3, 2, 9, 2, 0}, {0, 0, 9, 0, 5}};
+    for (const auto& [offset, limit, counted, found, behind] : kPages) {
+        const SearchQuery query = {{}, {}, offset, limit, counted};
         std::vector<FoundStudy> studies;
         std::vector<FoundSeries> series;
-        int behind[] = {-1, -1};
-        ASSERT_TRUE(search().studies(query, studies, &behind[0]).good());
-        ASSERT_TRUE(search().series(query, series, &behind[1]).good());
-        EXPECT_EQ(static_cast<int>(studies.size()), row.found);
-        EXPECT_EQ(static_cast<int>(series.size()), row.found);
-        EXPECT_EQ(behind[0], row.behind);
-        EXPECT_EQ(behind[1], row.behind);
+        int left[] = {-1, -1};
+        ASSERT_TRUE(search().studies(query, studies, &left[0]).good());
+        ASSERT_TRUE(search().series(query, series, &left[1]).good());
+        EXPECT_EQ(std::tuple(studies.size(), series.size(), left[0], left[1]),
+                  std::tuple(found, found, behind, behind))
+            << offset;
     }
 }
 

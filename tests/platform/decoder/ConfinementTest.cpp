@@ -27,14 +27,8 @@ bool canTake(std::size_t size)
     return memory != MAP_FAILED;
 }
 
-struct Attempt
-{
-    const char* name;
-    bool (*tries)();
-    int outcome;  ///< 1: what it says holds; -SIGSYS: the attempt ends the process
-};
-
-const Attempt kAttempts[] = {
+/// What is tried, and the outcome: 1 where what it says holds; -SIGSYS where the attempt ends the process.
+const std::tuple<const char*, bool (*)(), int> kAttempts[] = {
     {"ReadAFile", [] { return isForbidden(::open("/etc/passwd", O_RDONLY | O_CLOEXEC)); }, 1},
     {"WriteAFile",
      [] { return isForbidden(::open("/tmp/kdd-confined", O_WRONLY | O_CREAT | O_CLOEXEC, 0600)); }, 1},
@@ -89,9 +83,8 @@ const Attempt kAttempts[] = {
 TEST(Confinement, LeavesNothingButMemoryAndTheSocket)
 {
     EXPECT_EQ(inChild([] { return confine().good(); }), 1);
-    for (const Attempt& attempt : kAttempts)
-        EXPECT_EQ(inChild([&] { return confine().good() && attempt.tries(); }), attempt.outcome)
-            << attempt.name;
+    for (const auto& [name, attempt, outcome] : kAttempts)
+        EXPECT_EQ(inChild([tries = attempt] { return confine().good() && tries(); }), outcome) << name;
 }
 
 TEST(Confinement, BoundsMemoryForEachJob)

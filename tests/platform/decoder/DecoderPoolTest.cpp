@@ -1,5 +1,6 @@
 #include "DecoderFixture.h"
 #include "support/Process.h"
+#include "support/Setting.h"
 #include "support/Threads.h"
 
 #include <fcntl.h>
@@ -22,16 +23,11 @@ DecoderLimits shortLimits()
     return limits;
 }
 
-struct Fault
-{
-    const char* what;
-    const char* reason;  ///< what is said of it ends so
-};
-
 const char* const kBroken = "The decoder gave an answer that cannot be and was ended";
 const char* const kFalseFrame = "The decoder gave a frame that cannot be";
 
-const Fault kFaults[] = {
+/// What a decoder does, and how what is said of it ends.
+const std::pair<const char*, const char*> kFaults[] = {
     {"aborts", "It ended the decoder (signal 6)"},
     {"leaves", "It ended the decoder (status 7)"},
     {"half", "It ended the decoder (status 0)"},
@@ -62,12 +58,12 @@ const Fault kFaults[] = {
 
 TEST_F(DecoderPools, OutliveEveryFaultOfADecoder)
 {
-    for (const Fault& fault : kFaults) {
-        const QByteArray program = falseDecoder(fault.what);
+    for (const auto& [what, reason] : kFaults) {
+        const QByteArray program = falseDecoder(what);
         DecoderPool pool(program, shortLimits());
         for (int i = 0; i < 2; ++i) {
             const QString text = ask(pool).text();
-            EXPECT_TRUE(text.endsWith(QLatin1String(fault.reason))) << fault.what << ": " << qPrintable(text);
+            EXPECT_TRUE(text.endsWith(QLatin1String(reason))) << what << ": " << qPrintable(text);
         }
     }
 }
@@ -90,17 +86,15 @@ TEST_F(DecoderPools, TellWhenTheProgramIsNotThere)
 TEST_F(DecoderPools, HandNothingOver)
 {
     const int open = ::open("/dev/null", O_RDONLY);  // not closed by a start
-    qputenv("KDD_TEST_PASSWORD", "secret");
+    const Setting password("KDD_TEST_PASSWORD", "secret");
+    const Setting modules("KDD_MODULE_FOLDER", "/modules");
     qunsetenv("LD_LIBRARY_PATH");
-    qputenv("KDD_MODULE_FOLDER", "/modules");
     DecoderPool pool(falseDecoder("tells"));
     const QString text = ask(pool).text();
     EXPECT_FALSE(text.contains(QLatin1String("secret"))) << qPrintable(text);
     EXPECT_TRUE(text.contains(QLatin1String("KDD_MODULE_FOLDER=/modules "))) << qPrintable(text);
     // The socket, and two that lead nowhere.
     EXPECT_TRUE(text.endsWith(QLatin1String(" 3"))) << qPrintable(text);
-    qunsetenv("KDD_MODULE_FOLDER");
-    qunsetenv("KDD_TEST_PASSWORD");
     ::close(open);
 }
 

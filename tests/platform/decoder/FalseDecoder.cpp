@@ -4,11 +4,12 @@
 #include <sys/socket.h>
 #include <unistd.h>
 
+#include <array>
 #include <csignal>
 #include <cstdint>
 #include <cstdlib>
-#include <cstring>
 #include <fstream>
+#include <map>
 #include <string>
 #include <vector>
 
@@ -42,23 +43,6 @@ void say(std::uint32_t word, const std::string& head, const std::string& data = 
     put(data.data(), data.size());
 }
 
-void sayStart(std::uint32_t word, std::uint32_t head, std::int64_t data)
-{
-    const Start start = {word, head, data};
-    put(&start, sizeof start);
-}
-
-std::string numbers(const std::vector<std::int32_t>& values)
-{
-    return std::string(reinterpret_cast<const char*>(values.data()), values.size() * sizeof values[0]);
-}
-
-std::string range(std::int64_t offset, std::int64_t length)
-{
-    const std::int64_t both[] = {offset, length};
-    return std::string(reinterpret_cast<const char*>(both), sizeof both);
-}
-
 /// Reads a question to its end.
 void awaitQuestion()
 {
@@ -85,20 +69,43 @@ std::string possessions()
     return text + std::to_string(count - 3);
 }
 
-/// The frame that is right for the test's question: two pixels, of one byte each.
-const std::vector<std::int32_t> kFrame = {2, 1, 1, 0, 0, 0};
+/// What is told of a frame: its size, its samples, type, colour and how often it was halved; and its pixels. Right for the
+/// test's question are two pixels, of one byte each.
+const std::map<std::string, std::pair<std::vector<std::int32_t>, const char*>> kFrames = {
+    {"honest", {{2, 1, 1, 0, 0, 0}, "ab"}},       {"once-dead", {{2, 1, 1, 0, 0, 0}, "ab"}},
+    {"wide", {{3, 1, 1, 0, 0, 0}, "abc"}},        {"negative", {{2, -1, 1, 0, 0, 0}, "ab"}},
+    {"many-samples", {{2, 1, 3, 0, 0, 0}, "ab"}}, {"other-type", {{2, 1, 1, 2, 0, 0}, "ab"}},
+    {"no-type", {{2, 1, 1, 77, 0, 0}, "ab"}},     {"other-colour", {{2, 1, 1, 0, 2, 0}, "ab"}},
+    {"reduced", {{1, 1, 1, 0, 0, 1}, "a"}},       {"short-pixels", {{2, 1, 1, 0, 0, 0}, "a"}},
+    {"long-pixels", {{2, 1, 1, 0, 0, 0}, "abc"}},
+};
 
-std::vector<std::int32_t> frameWith(std::size_t at, std::int32_t value)
+/// Answers of which nothing follows.
+const std::map<std::string, Start> kStarts = {
+    {"huge-head", {kDone, 0xffffffff, 0}},
+    {"huge-data", {kDone, 24, std::int64_t(1) << 62}},
+    {"negative-data", {kDone, 24, -1}},
+    {"other-word", {4711, 0, 0}},
+};
+
+/// Bytes of the source that it asks for.
+const std::map<std::string, std::array<std::int64_t, 2>> kRanges = {
+    {"wants", {0, 1}}, {"wants-before", {-1, 1}}, {"wants-all", {0, std::int64_t(1) << 40}}};
+
+template <typename Numbers>
+std::string bytesOf(const Numbers& numbers)
 {
-    std::vector<std::int32_t> frame = kFrame;
-    frame[at] = value;
-    return frame;
+    return {reinterpret_cast<const char*>(numbers.data()), numbers.size() * sizeof numbers[0]};
 }
 
 void answer(const std::string& what, const std::string& file)
 {
-    if (what == "honest" || what == "once-dead")
-        say(kDone, numbers(kFrame), "ab");
+    if (const auto frame = kFrames.find(what); frame != kFrames.end())
+        say(kDone, bytesOf(frame->second.first), frame->second.second);
+    else if (const auto start = kStarts.find(what); start != kStarts.end())
+        put(&start->second, sizeof start->second);
+    else if (const auto range = kRanges.find(what); range != kRanges.end())
+        say(kWanted, bytesOf(range->second));
     else if (what == "aborts")
         std::abort();
     else if (what == "hangs" || what == "killed")
@@ -109,42 +116,10 @@ void answer(const std::string& what, const std::string& file)
         say(kFailed, possessions());
     else if (what == "tells-unprintable")
         say(kFailed, "a\nb\x1b[2Jc");
-    else if (what == "wide")
-        say(kDone, numbers(frameWith(0, 3)), "abc");
-    else if (what == "negative")
-        say(kDone, numbers(frameWith(1, -1)), "ab");
-    else if (what == "many-samples")
-        say(kDone, numbers(frameWith(2, 3)), "ab");
-    else if (what == "other-type")
-        say(kDone, numbers(frameWith(3, 2)), "ab");
-    else if (what == "no-type")
-        say(kDone, numbers(frameWith(3, 77)), "ab");
-    else if (what == "other-colour")
-        say(kDone, numbers(frameWith(4, 2)), "ab");
-    else if (what == "reduced")
-        say(kDone, numbers(frameWith(5, 1)), "a");
-    else if (what == "short-pixels")
-        say(kDone, numbers(kFrame), "a");
-    else if (what == "long-pixels")
-        say(kDone, numbers(kFrame), "abc");
     else if (what == "short-head")
         say(kDone, "x", "ab");
-    else if (what == "huge-head")
-        sayStart(kDone, 0xffffffff, 0);
-    else if (what == "huge-data")
-        sayStart(kDone, 24, std::int64_t(1) << 62);
-    else if (what == "negative-data")
-        sayStart(kDone, 24, -1);
-    else if (what == "other-word")
-        say(4711, {});
     else if (what == "half")
         put(file.data(), 3), std::_Exit(0);
-    else if (what == "wants")
-        say(kWanted, range(0, 1));
-    else if (what == "wants-before")
-        say(kWanted, range(-1, 1));
-    else if (what == "wants-all")
-        say(kWanted, range(0, std::int64_t(1) << 40));
 }
 
 }  // namespace

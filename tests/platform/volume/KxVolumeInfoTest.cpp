@@ -53,22 +53,14 @@ DatasetBuilder rampInWindow(const char* center, const char* width)
     return ramp().with(DCM_WindowCenter, center).with(DCM_WindowWidth, width);
 }
 
-struct RangeCase
-{
-    const char* name;
-    DatasetBuilder image;
-    double lowest;
-    double highest;
-};
-
-const RangeCase kRanges[] = {
+const std::tuple<const char*, DatasetBuilder, float, float> kRanges[] = {
     {"OfThePixels", ramp(), 0, 2000},
     {"OfTheWindow", rampInWindow("500", "400"), 300, 700},
     {"OfTheFirstUsableWindow", rampInWindow("5\\500", "0\\400"), 300, 700},
     {"NotOfAWindowBesideThePixels", rampInWindow("9000", "400"), 0, 2000},
     {"NotOfAWindowThatIsNoNumber", rampInWindow("x", "400"), 0, 2000},
-    {"Rescaled", ramp().with(DCM_RescaleSlope, "2").with(DCM_RescaleIntercept, "-1000"), -1000, 3000},
-    {"RescaledDownwards", ramp().with(DCM_RescaleSlope, "-1").with(DCM_RescaleIntercept, "0"), -2000, 0},
+    {"Rescaled", ramp().with("RescaleSlope=2|RescaleIntercept=-1000"), -1000, 3000},
+    {"RescaledDownwards", ramp().with("RescaleSlope=-1|RescaleIntercept=0"), -2000, 0},
     {"WithoutPadding", signedRamp().numbers(DCM_PixelPaddingValue, {0xf830}), -100, 1000},
     {"WithoutPaddingRange",
      signedRamp().numbers(DCM_PixelPaddingValue, {0xf830}).numbers(DCM_PixelPaddingRangeLimit, {0xff9c}), 0,
@@ -76,8 +68,7 @@ const RangeCase kRanges[] = {
     {"OfOneValueBesidesPadding", ramp().words({0, 0, 255, 255}).numbers(DCM_PixelPaddingValue, {0}), 0, 255},
     {"OfTheLogarithm",
      ramp()
-         .with(DCM_Modality, "XA")
-         .with(DCM_PixelIntensityRelationship, "LOG")
+         .with("Modality=XA|PixelIntensityRelationship=LOG")
          .withItem(DCM_ModalityLUTSequence, lookUp({3, 99, 16}, {7, 500, 900})),
      0, 2000},
     {"OfTheModalityTable", ramp().withItem(DCM_ModalityLUTSequence, lookUp({3, 99, 16}, {7, 500, 900})), 7,
@@ -96,19 +87,18 @@ const RangeCase kRanges[] = {
                    group(DCM_FrameVOILUTSequence, window("500", "400"))),
      300, 700},
     {"RescaledAsAllFramesAre",
-     ramp().withItem(DCM_SharedFunctionalGroupsSequence,
-                     group(DCM_PixelValueTransformationSequence,
-                           anItem().with(DCM_RescaleSlope, "3").with(DCM_RescaleIntercept, "1"))),
+     ramp().withItem(
+         DCM_SharedFunctionalGroupsSequence,
+         group(DCM_PixelValueTransformationSequence, anItem().with("RescaleSlope=3|RescaleIntercept=1"))),
      1, 6001},
 };
 
 TEST(KxVolumeInfo, TakesTheRangeFromWhereTheImageTellsIt)
 {
-    for (const RangeCase& range : kRanges) {
-        const auto info = show(range.image);
-        ASSERT_TRUE(info) << range.name;
-        EXPECT_EQ(info->lowestValue(), float(range.lowest)) << range.name;
-        EXPECT_EQ(info->highestValue(), float(range.highest)) << range.name;
+    for (const auto& [name, image, lowest, highest] : kRanges) {
+        const auto info = show(image);
+        ASSERT_TRUE(info) << name;
+        EXPECT_EQ(std::pair(info->lowestValue(), info->highestValue()), std::pair(lowest, highest)) << name;
     }
 }
 
@@ -140,24 +130,15 @@ TEST(KxVolumeInfo, ReducesByMeansOfWholeBlocks)
     EXPECT_EQ(show(image, 3, 1)->width(), 5);  // halves would be below three
 }
 
-struct AspectCase
-{
-    const char* name;
-    DcmTagKey key;
-    const char* value;
-    float aspect;
-};
-
-const AspectCase kAspects[] = {
+const std::tuple<const char*, DcmTagKey, const char*, float> kAspects[] = {
     {"Spacing", DCM_PixelSpacing, "2\\1", 0.5F},      {"Imager", DCM_ImagerPixelSpacing, "0.5\\1", 2},
     {"Ratio", DCM_PixelAspectRatio, "4\\3", 0.75F},   {"Zero", DCM_PixelSpacing, "0\\1", 1},
     {"Unbelievable", DCM_PixelSpacing, "1\\1000", 1}, {"One", DCM_PixelSpacing, "1", 1}};
 
 TEST(KxVolumeInfo, AspectIsWidthOverHeight)
 {
-    for (const AspectCase& aspect : kAspects)
-        EXPECT_EQ(show(ramp().with(aspect.key, aspect.value))->pixelAspectRatio(), aspect.aspect)
-            << aspect.name;
+    for (const auto& [name, key, value, aspect] : kAspects)
+        EXPECT_EQ(show(ramp().with(key, value))->pixelAspectRatio(), aspect) << name;
 }
 
 TEST(KxVolumeInfo, LowValuesAreWhiteWhereTheImageSaysSo)
@@ -213,12 +194,10 @@ TEST(KxVolumeInfo, OfAVideoShowsAFrameAtThreeTenths)
                                                               << path),
               0);
     const QByteArray video = fileContent(path);
-    auto* pixels = new DcmPixelData(DCM_PixelData);
     // The fragments of a video are cut anywhere.
-    pixels->putOriginalRepresentation(EXS_MPEG4HighProfileLevel4_1, nullptr,
-                                      sequenceOf({"", video.left(1000), video.mid(1000)}).release());
-    const auto image = aPicture(64, 64, 8, "YBR_PARTIAL_420").with(DCM_NumberOfFrames, "40");
-    image.dataset().insert(pixels);
+    const auto image = aPicture(64, 64, 8, "YBR_PARTIAL_420")
+                           .with(DCM_NumberOfFrames, "40")
+                           .fragments(EXS_MPEG4HighProfileLevel4_1, {"", video.left(1000), video.mid(1000)});
     const auto info = show(image, 32, 32);
     ASSERT_TRUE(info);
     EXPECT_EQ(info->width(), 32);

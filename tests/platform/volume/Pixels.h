@@ -5,29 +5,8 @@
 #include "platform/volume/StoredFrame.h"
 #include "support/DatasetBuilder.h"
 
-#include <QByteArray>
-#include <QVector>
-
-#include <dcmtk/config/osconfig.h>
-
-#include <dcmtk/dcmdata/dcpixseq.h>
-#include <dcmtk/dcmdata/dcpxitem.h>
-
 namespace Kdd
 {
-
-/// Compressed pixel data; the first part is the offset table.
-inline std::unique_ptr<DcmPixelSequence> sequenceOf(const QVector<QByteArray>& parts)
-{
-    auto sequence = std::make_unique<DcmPixelSequence>(DcmTag(DCM_PixelData, EVR_OB));
-    for (const QByteArray& part : parts) {
-        auto* fragment = new DcmPixelItem(DcmTag(DCM_Item, EVR_OB));
-        fragment->putUint8Array(reinterpret_cast<const Uint8*>(part.constData()),
-                                static_cast<unsigned long>(part.size()));
-        sequence->insert(fragment);
-    }
-    return sequence;
-}
 
 /// All numbers of a picture.
 inline QVector<double> numbersOf(const TypedData2D& pixels)

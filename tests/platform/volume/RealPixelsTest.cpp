@@ -2,6 +2,8 @@
 #include "platform/volume/FragmentReader.h"
 #include "support/RealFiles.h"
 
+#include <dcmtk/dcmdata/dcpixseq.h>
+#include <dcmtk/dcmdata/dcpxitem.h>
 #include <dcmtk/dcmdata/dcrledrg.h>
 #include <dcmtk/dcmimage/diregist.h>
 #include <dcmtk/dcmimgle/dcmimage.h>
@@ -38,13 +40,7 @@ protected:
 };
 
 /// The same image in several transfer syntaxes without loss, and a frame of it.
-struct Twins
-{
-    int frame;
-    std::vector<const char*> files;
-};
-
-const Twins kTwins[] = {
+const std::tuple<int, std::vector<const char*>> kTwins[] = {
     {0,
      {"explicit-le/CT1_UNC.explicit_little_endian.dcm", "explicit-be/CT1_UNC.explicit_big_endian.dcm",
       "implicit-le/CT1_UNC.implicit_little_endian.dcm", "jpeg-lossless-sv1-70/CT1_JPLL", "rle/CT1_RLE",
@@ -79,12 +75,12 @@ const Twins kTwins[] = {
 
 TEST_F(RealPixels, AreTheSameInEveryLosslessTransferSyntax)
 {
-    for (const Twins& twins : kTwins) {
+    for (const auto& [frame, files] : kTwins) {
         StoredFrame first;
-        for (const char* name : twins.files) {
+        for (const char* name : files) {
             const auto file = load(inTransferSyntaxes(name));
             StoredFrame stored;
-            const Result result = readStoredFrame(*file->getDataset(), twins.frame, 0, stored);
+            const Result result = readStoredFrame(*file->getDataset(), frame, 0, stored);
             ASSERT_TRUE(result.good()) << name << ": " << qPrintable(result.text());
             if (first.pixels.isEmpty())
                 first = stored;

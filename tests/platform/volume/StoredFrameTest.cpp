@@ -24,14 +24,7 @@ DatasetBuilder twelveBits(const char* highBit)
     return aPicture(1, 2, 16).with(DCM_BitsStored, "12").with(DCM_HighBit, highBit);
 }
 
-struct LayoutCase
-{
-    const char* name;
-    DatasetBuilder image;
-    QVector<double> expected;
-};
-
-const LayoutCase kLayouts[] = {
+const std::tuple<const char*, DatasetBuilder, QVector<double>> kLayouts[] = {
     {"Bytes", aPicture(1, 2, 8).bytes({7, 255}), {7, 255}},
     {"SignedBytes", aPicture(1, 2, 8).with(DCM_PixelRepresentation, "1").bytes({7, 255}), {7, -1}},
     {"OverlayBitsAbove", twelveBits("11").words({0xf123, 0x1fff}), {0x123, 0xfff}},
@@ -53,8 +46,8 @@ const LayoutCase kLayouts[] = {
 
 TEST(StoredFrame, UnpacksEveryLayout)
 {
-    for (const LayoutCase& layout : kLayouts)
-        EXPECT_EQ(storedNumbers(layout.image), layout.expected) << layout.name;
+    for (const auto& [name, image, expected] : kLayouts)
+        EXPECT_EQ(storedNumbers(image), expected) << name;
 }
 
 TEST(StoredFrame, FramesOfSingleBitsNeedNotBeginAtAByte)
@@ -66,15 +59,7 @@ TEST(StoredFrame, FramesOfSingleBitsNeedNotBeginAtAByte)
     EXPECT_EQ(storedNumbers(image, 2), (QVector<double>{1, 1, 1, 0, 0}));
 }
 
-struct Refusal
-{
-    const char* name;
-    DatasetBuilder image;
-    int frame;
-    const char* reason;
-};
-
-const Refusal kRefusals[] = {
+const std::tuple<const char*, DatasetBuilder, int, const char*> kRefusals[] = {
     {"NoPixels", aPicture(1, 1, 8), 0, "There are no pixel data"},
     {"NoRows", aPicture(0, 1, 8).bytes({1, 2}), 0, "1 columns and 0 rows are no size of an image"},
     {"Huge", aPicture(65535, 65535, 8).bytes({1, 2}), 0,
@@ -90,10 +75,10 @@ const Refusal kRefusals[] = {
 
 TEST(StoredFrame, RefusesWhatCannotBeAnImage)
 {
-    for (const Refusal& refusal : kRefusals) {
+    for (const auto& [name, image, frame, reason] : kRefusals) {
         StoredFrame stored;
-        const Result result = readStoredFrame(refusal.image.dataset(), refusal.frame, 0, stored);
-        EXPECT_STREQ(qPrintable(result.text()), refusal.reason) << refusal.name;
+        const Result result = readStoredFrame(image.dataset(), frame, 0, stored);
+        EXPECT_STREQ(qPrintable(result.text()), reason) << name;
     }
 }
 
@@ -118,18 +103,10 @@ TEST(StoredFrame, ReadsOneFrameOfAFileAndNoMore)
     EXPECT_EQ(numbersOf(stored.pixels), QVector<double>(kSide * kSide, 20));
 }
 
-struct FragmentCase
-{
-    const char* name;
-    QVector<QByteArray> parts;  // the offset table first
-    int frame;
-    int frames;
-    QByteArray expected;
-};
-
 const QByteArray kStart = "\xff\xd8\xff";
 
-const FragmentCase kFragments[] = {
+/// Parts, of which the first is the offset table, and one of so many frames in them.
+const std::tuple<const char*, QVector<QByteArray>, int, int, QByteArray> kFragments[] = {
     {"OneForEachFrame", {"", "aa", "bb", "cc"}, 1, 3, "bb"},
     {"AllOfOneFrame", {"", "aa", "bb", "cc"}, 0, 1, "aabbcc"},
     {"ByTheTable", {QByteArray("\0\0\0\0\x14\0\0\0", 8), "aa", "bb", "cc", "dd"}, 1, 2, "ccdd"},
@@ -142,12 +119,11 @@ const FragmentCase kFragments[] = {
 
 TEST(FragmentReader, FindsTheFragmentsOfAFrame)
 {
-    for (const FragmentCase& fragments : kFragments) {
+    for (const auto& [name, parts, frame, frames, expected] : kFragments) {
         QByteArray bytes;
-        const Result result =
-            readFrameBytes(*sequenceOf(fragments.parts), fragments.frame, fragments.frames, bytes);
-        EXPECT_EQ(result.good(), !fragments.expected.isEmpty()) << fragments.name;
-        EXPECT_EQ(bytes, fragments.expected) << fragments.name;
+        const Result result = readFrameBytes(*sequenceOf(parts), frame, frames, bytes);
+        EXPECT_EQ(result.good(), !expected.isEmpty()) << name;
+        EXPECT_EQ(bytes, expected) << name;
     }
 }
 

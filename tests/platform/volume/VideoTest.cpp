@@ -1,5 +1,3 @@
-#include "platform/decoder/DecoderPool.h"
-#include "platform/volume/ApartVideo.h"
 #include "platform/volume/KxCompressedDataMedia.h"
 #include "support/BytesRead.h"
 #include "support/FileContent.h"
@@ -8,7 +6,6 @@
 #include <QProcess>
 
 #include <cstdlib>
-#include <cstring>
 
 using namespace Kdd;
 
@@ -59,15 +56,8 @@ protected:
     QTemporaryDir mFolder;
 };
 
-struct Format
-{
-    const char* name;
-    const char* encoder;
-    int height;
-    double tolerance;  ///< in time: without times in the container only bytes tell where a frame is
-};
-
-const Format kFormats[] = {
+/// With the height, and the tolerance in time: without times in the container only bytes tell where a frame is.
+const std::tuple<const char*, const char*, int, double> kFormats[] = {
     {"mpeg2.mpg", "-c:v mpeg2video", 120, 0.02},
     {"mpeg2.m2v", "-c:v mpeg2video -f mpeg2video", 120, 0.1},
     {"h264.mp4", "-c:v libx264 -pix_fmt yuv420p", 120, 0.02},
@@ -80,55 +70,15 @@ const Format kFormats[] = {
 
 TEST_F(Video, OfEveryFormatGivesTheFrameAtTheWantedTime)
 {
-    for (const Format& format : kFormats) {
-        SCOPED_TRACE(format.name);
-        const TypedData2D frame = frameOf(make(format.name, format.encoder), 0.3);
-        ASSERT_EQ(std::make_pair(frame.width, frame.height), std::make_pair(160, format.height));
-        EXPECT_NEAR(timeOf(frame), 0.3, format.tolerance);
+    for (const auto& [name, encoder, height, tolerance] : kFormats) {
+        SCOPED_TRACE(name);
+        const TypedData2D frame = frameOf(make(name, encoder), 0.3);
+        ASSERT_EQ(std::make_pair(frame.width, frame.height), std::make_pair(160, height));
+        EXPECT_NEAR(timeOf(frame), 0.3, tolerance);
         EXPECT_NEAR(colour(frame, 150, 9, 0), 255 * (1 - timeOf(frame)), 12);
         EXPECT_GT(colour(frame, 9, 9, 1), 240);
-        EXPECT_LT(colour(frame, 9, format.height - 9, 1), 20);
+        EXPECT_LT(colour(frame, 9, height - 9, 1), 20);
     }
-}
-
-/// Bytes of which no more than a few are given at a time, as fragments of a dataset are.
-class ShortReads : public MediaSource
-{
-public:
-    explicit ShortReads(QByteArray bytes)
-        : mBytes(std::move(bytes))
-    {
-    }
-    qint64 size() const override { return mBytes.size(); }
-    qint64 read(qint64 offset, char* out, qint64 length) override
-    {
-        const QByteArray part = mBytes.mid(int(offset), int(qMin<qint64>(length, 1000)));
-        std::memcpy(out, part.constData(), size_t(part.size()));
-        return part.size();
-    }
-
-private:
-    QByteArray mBytes;
-};
-
-TEST_F(Video, IsTheSameWhenItIsDecodedApart)
-{
-    for (const Format& format : kFormats) {
-        ShortReads source(fileContent(make(format.name, format.encoder)));
-        const VideoPlace place = {160, 160, 0.7};
-        TypedData2D inside;
-        TypedData2D apart;
-        ASSERT_TRUE(decodeVideoInside(source, place, inside).good()) << format.name;
-        const Result result = decodeVideoApart(DecoderPool::ofProcess(), source, place, apart);
-        EXPECT_TRUE(result.good()) << format.name << qPrintable(result.text());
-        EXPECT_EQ(apart.width, inside.width) << format.name;
-        EXPECT_TRUE(apart.pixels == inside.pixels) << format.name;
-    }
-    ShortReads nothing("no video");
-    TypedData2D inside;
-    TypedData2D apart;
-    EXPECT_EQ(decodeVideoApart(DecoderPool::ofProcess(), nothing, {9, 9, 0}, apart).text().toStdString(),
-              decodeVideoInside(nothing, {9, 9, 0}, inside).text().toStdString());
 }
 
 TEST_F(Video, EndsWithItsLastFrameAndIsNeverEnlarged)

@@ -70,14 +70,7 @@ TEST(DamagedVolumeFile, IsRefusedOrGivesTheTruePixels)
     EXPECT_EQ(H5Fget_obj_count(static_cast<hid_t>(H5F_OBJ_ALL), H5F_OBJ_ALL), 0);
 }
 
-/// A sound file in which one thing is replaced through the library itself, checksums and all.
-struct Hostile
-{
-    const char* name;
-    const char* reason;
-    std::function<void(hid_t file)> change;
-};
-
+using Change = std::function<void(hid_t file)>;
 using Dims = std::vector<hsize_t>;
 
 void putDataset(hid_t file, const char* name, hid_t type, const Dims& dims, hid_t properties)
@@ -139,18 +132,23 @@ void putAttribute(hid_t file, const char* group, hid_t type, hsize_t count)
 }
 
 /// Another lattice in place of the one that is there.
-std::function<void(hid_t)> pixels(hid_t type, const Dims& dims, const Dims& chunk)
+Change lattice(hid_t type, const Dims& dims, hid_t properties)
 {
-    return [=](hid_t file) { putDataset(file, kLevel0, type, dims, compressed(chunk)); };
+    return [=](hid_t file) { putDataset(file, kLevel0, type, dims, properties); };
+}
+
+Change pixels(hid_t type, const Dims& dims, const Dims& chunk)
+{
+    return lattice(type, dims, compressed(chunk));
 }
 
 /// A dataset of one dimension.
-std::function<void(hid_t)> row(const char* name, hid_t type, hsize_t count, hsize_t chunk)
+Change row(const char* name, hid_t type, hsize_t count, hsize_t chunk)
 {
     return [=](hid_t file) { putDataset(file, name, type, {count}, compressed({chunk})); };
 }
 
-std::function<void(hid_t)> parameter(hid_t type, hsize_t count)
+Change parameter(hid_t type, hsize_t count)
 {
     return [=](hid_t file) { putAttribute(file, "Parameters", type, count); };
 }
@@ -158,7 +156,7 @@ std::function<void(hid_t)> parameter(hid_t type, hsize_t count)
 constexpr hsize_t kMany = 1 << 22;
 
 /// More members of a group than there may be, all of them one empty bundle.
-std::function<void(hid_t)> members(QByteArray group, int count)
+Change members(QByteArray group, int count)
 {
     return [=](hid_t file) {
         const hid_t one = H5Gcreate2(file, "Empty", H5P_DEFAULT, H5P_DEFAULT, H5P_DEFAULT);
@@ -196,7 +194,8 @@ void putParameters(hid_t file)
                        H5P_DEFAULT);
 }
 
-const Hostile kHostile[] = {
+/// A sound file in which one thing is replaced through the library itself, checksums and all, and why it is refused then.
+const std::tuple<const char*, const char*, Change> kHostile[] = {
     {"ClaimsPixelsThatAreNotThere", "slice 0: is not in the file",
      pixels(H5T_STD_U16LE, {9, 20'000, 20'000}, {1, 20'000, 20'000})},
     {"ChunkInflatesToAnotherLength", "slice 2: is damaged", [](hid_t f) { putChunk(f, 401); }},
@@ -206,22 +205,16 @@ const Hostile kHostile[] = {
     {"BigEndian", "unknown type", pixels(H5T_STD_U16BE, {2, 4, 4}, {1, 4, 4})},
     {"VariableTexts", "neither numbers nor characters",
      [](hid_t f) {
-         putDataset(f, kLevel0, variableText(), Dims{1, 2, 3}, compressed({1, 2, 3}));
+         pixels(variableText(), {1, 2, 3}, {1, 2, 3})(f);
      }},
-    {"NotCompressed", "is not compressed",
-     [](hid_t f) {
-         putDataset(f, kLevel0, H5T_STD_U8LE, Dims{2, 4, 4}, chunked({1, 4, 4}));
-     }},
+    {"NotCompressed", "is not compressed", lattice(H5T_STD_U8LE, {2, 4, 4}, chunked({1, 4, 4}))},
     {"OtherFilter", "has filter",
      [](hid_t f) {
          const hid_t properties = compressed({1, 4, 4});
          H5Pset_fletcher32(properties);
          putDataset(f, kLevel0, H5T_STD_U16LE, {2, 4, 4}, properties);
      }},
-    {"VirtualPixels", "not stored in chunks",
-     [](hid_t f) {
-         putDataset(f, kLevel0, H5T_STD_U8LE, Dims{1, 2, 3}, virtualStorage());
-     }},
+    {"VirtualPixels", "not stored in chunks", lattice(H5T_STD_U8LE, {1, 2, 3}, virtualStorage())},
     {"LinkToAnotherFile", "is a link to elsewhere",
      [](hid_t f) { H5Lcreate_external("o.vol", "/", f, "Parameters/Link", H5P_DEFAULT, H5P_DEFAULT); }},
     {"BundleInsideItself", "nested too deep",
@@ -269,15 +262,15 @@ hid_t openForChange(const VolumeFileBuilder& builder)
 
 TEST(HostileVolumeFile, IsRefusedWithTheReason)
 {
-    for (const Hostile& hostile : kHostile) {
+    for (const auto& [name, reason, change] : kHostile) {
         const VolumeFileBuilder builder;
         ASSERT_TRUE(builder.write(aLattice()).good());
         const hid_t file = openForChange(builder);
-        hostile.change(file);
+        change(file);
         ASSERT_GE(H5Fclose(file), 0);
         const Result result = readAll(builder.bytes());
-        EXPECT_TRUE(result.text().contains(QLatin1String(hostile.reason)))
-            << hostile.name << ": " << qPrintable(result.text());
+        EXPECT_TRUE(result.text().contains(QLatin1String(reason)))
+            << name << ": " << qPrintable(result.text());
     }
 }
 

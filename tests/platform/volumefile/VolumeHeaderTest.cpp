@@ -61,23 +61,21 @@ TEST(VolumeHeader, ThatNoFileCanHaveIsRefused)
 {
     using Change = void (*)(LocatedHeader&);
     const Change changes[] = {
-        [](LocatedHeader& header) { header.header.lattices[0].dims[0] = 0; },
-        [](LocatedHeader& header) { header.header.lattices[0].dims[1] = kMaxDimension + 1; },
-        [](LocatedHeader& header) {
-            header.header.lattices[0].dims[0] = header.header.lattices[0].dims[1] = 100'000;
-        },
-        [](LocatedHeader& header) { header.header.lattices[0].dims[2] = 3; },
-        [](LocatedHeader& header) { header.header.lattices[0].dims.append(1); },
-        [](LocatedHeader& header) { header.header.lattices[0].components = kMaxComponents + 1; },
-        [](LocatedHeader& header) { header.header.lattices[0].type = static_cast<PrimitiveType>(99); },
-        [](LocatedHeader& header) { header.numCounts[0] = kMaxCounts + 1; },
-        [](LocatedHeader& header) { header.counts.append(ChunkPlace()); },
-        [](LocatedHeader& header) { header.header.dataSections[0] = QByteArray(kMaxNameLength + 1, 'x'); },
-        [](LocatedHeader& header) {
+        [](LocatedHeader& of) { of.header.lattices[0].dims[0] = 0; },
+        [](LocatedHeader& of) { of.header.lattices[0].dims[1] = kMaxDimension + 1; },
+        [](LocatedHeader& of) { of.header.lattices[0].dims[0] = of.header.lattices[0].dims[1] = 100'000; },
+        [](LocatedHeader& of) { of.header.lattices[0].dims[2] = 3; },
+        [](LocatedHeader& of) { of.header.lattices[0].dims.append(1); },
+        [](LocatedHeader& of) { of.header.lattices[0].components = kMaxComponents + 1; },
+        [](LocatedHeader& of) { of.header.lattices[0].type = static_cast<PrimitiveType>(99); },
+        [](LocatedHeader& of) { of.numCounts[0] = kMaxCounts + 1; },
+        [](LocatedHeader& of) { of.counts.append(ChunkPlace()); },
+        [](LocatedHeader& of) { of.header.dataSections[0] = QByteArray(kMaxNameLength + 1, 'x'); },
+        [](LocatedHeader& of) {
             for (int i = 0; i <= kMaxBundleDepth; ++i) {
                 ParamBundle above;
-                above.insertBundle("below", header.header.parameters);
-                header.header.parameters = above;
+                above.insertBundle("below", of.header.parameters);
+                of.header.parameters = above;
             }
         },
     };

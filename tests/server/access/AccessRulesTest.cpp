@@ -42,11 +42,7 @@ TEST(AccessRules, SayWhoMayWhat)
 TEST(AccessRules, OpenNoDoorByASlip)
 {
     const QByteArray tokens = QByteArray(R"({"tokens":{)") + kTokens;
-    const struct
-    {
-        QByteArray text;
-        const char* reason;
-    } kFiles[] = {
+    const std::pair<QByteArray, const char*> kFiles[] = {
         {"", "no JSON object"},
         {"[]", "no JSON object"},
         {R"({"anyone":[],"anyone":["read"]})", "says something twice"},
@@ -89,11 +85,11 @@ TEST(AccessRules, OpenNoDoorByASlip)
         {R"({"anyone":["read"],"syslog":{"to":"tls://a/b"}})", "syslog.to is no receiver"},
         {R"({"anyone":["read"],"syslog":{"to":"unix:log"}})", "syslog.to is no receiver"},
     };
-    for (const auto& each : kFiles) {
+    for (const auto& [text, reason] : kFiles) {
         AccessRules rules;
-        const Result result = AccessRules::parse(each.text, rules);
-        EXPECT_NE(result.text().toStdString().find(each.reason), std::string::npos)
-            << each.text.toStdString() << ": " << result.text().toStdString();
+        const Result result = AccessRules::parse(text, rules);
+        EXPECT_NE(result.text().toStdString().find(reason), std::string::npos)
+            << text.toStdString() << ": " << result.text().toStdString();
         EXPECT_FALSE(rules.anyone || rules.tokens || rules.header || rules.certificates);
     }
 }
@@ -103,25 +99,18 @@ TEST(AccessRules, SayWhereMessagesGoAndPeopleSignIn)
     AccessRules rules;
     const QByteArray begin =
         QByteArray(R"({"tokens":{)") + kTokens + R"(},"signIn":{"client":"c","sessionKeys":"k"},)";
-    const struct
-    {
-        const char* to;
-        SyslogRules::By by;
-        const char* host;
-        const char* port;
-    } kReceivers[] = {
+    const std::tuple<const char*, SyslogRules::By, const char*, const char*> kReceivers[] = {
         {"tls://Audit.example", SyslogRules::By::Tls, "audit.example", "6514"},
         {"tls://audit.example:1234", SyslogRules::By::Tls, "audit.example", "1234"},
         {"udp://[::1]", SyslogRules::By::Udp, "::1", "514"},
         {"udp://[0::1]:99", SyslogRules::By::Udp, "::1", "99"},
         {"unix:/dev/log", SyslogRules::By::Socket, "/dev/log", ""},
     };
-    for (const auto& each : kReceivers) {
-        ASSERT_EQ(AccessRules::parse(begin + R"("syslog":{"to":")" + each.to + "\"}}", rules).text(),
-                  QString());
-        EXPECT_EQ(rules.syslog->by, each.by) << each.to;
-        EXPECT_EQ(rules.syslog->host, each.host) << each.to;
-        EXPECT_EQ(rules.syslog->port, each.port) << each.to;
+    for (const auto& [to, by, host, port] : kReceivers) {
+        ASSERT_EQ(AccessRules::parse(begin + R"("syslog":{"to":")" + to + "\"}}", rules).text(), QString());
+        EXPECT_EQ(rules.syslog->by, by) << to;
+        EXPECT_EQ(rules.syslog->host, host) << to;
+        EXPECT_EQ(rules.syslog->port, port) << to;
     }
     EXPECT_TRUE(rules.signIn->discovery.endsWith("/.well-known/openid-configuration"));
 }

@@ -1,6 +1,6 @@
 #include "server/access/AddressGuard.h"
 
-#include <gtest/gtest.h>
+#include "server/Handled.h"
 
 using namespace Kdd;
 using Access::AddressRules;
@@ -19,18 +19,16 @@ public:
 
 /// The base that a handler is told, or the status of who is not let through.
 std::string baseFor(const AddressRules& rules, const QByteArray& base, const QByteArray& peer = "127.0.0.1",
-                    const QVector<Http::Field>& headers = {})
+                    const Headers& headers = {})
 {
     AddressRules normal = rules;
     EXPECT_EQ(normal.normalise().text(), QString());
     BaseAsText inner;
-    Http::Request request;
+    Http::Request request = requestFor("/", headers);
     request.base = base;
     request.peer = peer;
-    request.headers = headers;
     const Http::Response response = Access::AddressGuard(normal, inner).answer(request);
-    return response.status == 200 ? std::get<QByteArray>(response.body[0]).toStdString()
-                                  : std::to_string(response.status);
+    return response.status == 200 ? bodyOf(response).toStdString() : std::to_string(response.status);
 }
 
 TEST(AddressGuard, LetsOnlyThoseThroughWhoNameThisServer)
@@ -50,9 +48,9 @@ TEST(AddressGuard, LetsOnlyThoseThroughWhoNameThisServer)
 
 TEST(AddressGuard, BelievesOnlyNamedProxies)
 {
-    const QVector<Http::Field> kForwarded = {{"x-forwarded-proto", "https"},
-                                             {"x-forwarded-host", "far.example, pacs.example:8443"},
-                                             {"x-forwarded-prefix", "/a/b/"}};
+    const Headers kForwarded = {{"x-forwarded-proto", "https"},
+                                {"x-forwarded-host", "far.example, pacs.example:8443"},
+                                {"x-forwarded-prefix", "/a/b/"}};
     const AddressRules rules = {{}, {}, {"127.0.0.1", "0:0::1"}};
     EXPECT_EQ(baseFor(rules, "http://localhost:80", "127.0.0.1", kForwarded),
               "https://pacs.example:8443/a/b");
@@ -65,11 +63,7 @@ TEST(AddressGuard, BelievesOnlyNamedProxies)
 
 TEST(AddressGuard, TakesOfAProxyOnlyWhatCanBeAnAddress)
 {
-    const struct
-    {
-        Http::Field header;
-        const char* base;
-    } kHeaders[] = {
+    const std::pair<Http::Field, const char*> kHeaders[] = {
         {{"forwarded", "for=1.2.3.4;proto=https;host=\"pacs.example:1\""}, "https://pacs.example:1"},
         {{"forwarded", "host=far.example;proto=ftp, Proto=HTTPS;Host=pacs.example"}, "https://pacs.example"},
         {{"forwarded", "for=\"[::1]:80\""}, "http://localhost:80"},
@@ -82,19 +76,14 @@ TEST(AddressGuard, TakesOfAProxyOnlyWhatCanBeAnAddress)
         {{"x-forwarded-prefix", "/a?b"}, "http://localhost:80"},
         {{"x-forwarded-prefix", "/"}, "http://localhost:80"},
     };
-    for (const auto& each : kHeaders)
-        EXPECT_EQ(baseFor({{}, {}, {"127.0.0.1"}}, "http://localhost:80", "127.0.0.1", {each.header}),
-                  each.base)
-            << each.header.value.constData();
+    for (const auto& [header, base] : kHeaders)
+        EXPECT_EQ(baseFor({{}, {}, {"127.0.0.1"}}, "http://localhost:80", "127.0.0.1", {header}), base)
+            << header.value.constData();
 }
 
 TEST(AddressRules, NameTheValueThatTheyCannotFollow)
 {
-    const struct
-    {
-        AddressRules rules;
-        const char* named;
-    } kRules[] = {
+    const std::pair<AddressRules, const char*> kRules[] = {
         {{"images.example.org", {}, {}}, "images.example.org"},
         {{"ftp://images.example.org", {}, {}}, "ftp://images.example.org"},
         {{"https://", {}, {}}, "https:"},
@@ -104,9 +93,9 @@ TEST(AddressRules, NameTheValueThatTheyCannotFollow)
         {{{}, {}, {"proxy.example"}}, "proxy.example"},
         {{{}, {}, {"10.0.0.0/8"}}, "10.0.0.0/8"},
     };
-    for (const auto& each : kRules) {
-        AddressRules rules = each.rules;
-        EXPECT_TRUE(rules.normalise().text().contains(QLatin1String(each.named))) << each.named;
+    for (const auto& [given, named] : kRules) {
+        AddressRules rules = given;
+        EXPECT_TRUE(rules.normalise().text().contains(QLatin1String(named))) << named;
     }
 }
 

@@ -1,5 +1,6 @@
 #include "server/access/AuditMessages.h"
 
+#include "server/Handled.h"
 #include "server/http/Client.h"
 #include "support/LogCapture.h"
 
@@ -92,9 +93,7 @@ private:
 Http::Exchange anExchange(Http::Method method, const char* path, int status = 200)
 {
     Http::Exchange exchange;
-    exchange.request.method = method;
-    for (const QByteArray& segment : QByteArray(path).split('/'))
-        exchange.request.path.append(segment);
+    exchange.request = requestFor(path, {}, method);
     exchange.request.query = {{"PatientName", "Doe"}, {"code", "secret"}};
     exchange.request.peer = "10.0.0.7";
     exchange.caller = "anna<\"&\x01";
@@ -138,13 +137,7 @@ TEST(AuditMessagesTest, NameTheEventByWhatIsDone)
     const auto kGet = Http::Method::Get;
     const auto kPost = Http::Method::Post;
     const auto kDelete = Http::Method::Delete;
-    const struct
-    {
-        Http::Method method;
-        const char* path;
-        int status;
-        const char* told;
-    } kExchanges[] = {
+    const std::tuple<Http::Method, const char*, int, const char*> kExchanges[] = {
         {kGet, "dicom-web/studies", 200, "E 0 110112 anna<\"&"},
         {kGet, "dicom-web/studies/1.2/series/1.3/instances/1.4/frames/1", 200, "R 0 110104 anna<\"& 1.2"},
         {kGet, "dicom-web/studies/1.2/metadata", 403, "R 4 110103 anna<\"& 1.2"},
@@ -159,8 +152,8 @@ TEST(AuditMessagesTest, NameTheEventByWhatIsDone)
         {kGet, "browser/config", 200, ""},
         {Http::Method::Options, "dicom-web/studies", 204, ""},
     };
-    for (const auto& each : kExchanges)
-        EXPECT_EQ(told(anExchange(each.method, each.path, each.status)), each.told) << each.path;
+    for (const auto& [method, path, status, expected] : kExchanges)
+        EXPECT_EQ(told(anExchange(method, path, status)), expected) << path;
     Http::Exchange stored = anExchange(kPost, "dicom-web/studies");
     stored.effect = Http::Effect{{"1.2", "5"}, 2};
     EXPECT_EQ(told(stored), "C 0 110104 anna<\"& 1.2\nC 0 110104 anna<\"& 5");

@@ -74,11 +74,7 @@ TEST(SessionSeal, TakesNoKeysThatAreNone)
 TEST(ProviderAddressesTest, AreOfTheIssuerAndEncrypted)
 {
     const QByteArray good = R"({"issuer":"i","authorization_endpoint":"https://a.example/b?c=d",)";
-    const struct
-    {
-        QByteArray text;
-        bool isGood;
-    } kTexts[] = {
+    const std::pair<QByteArray, bool> kTexts[] = {
         {good + R"("token_endpoint":"https://a.example/t"})", true},
         {good + R"("token_endpoint":"http://127.0.0.1:80/t"})", true},
         {good + R"("token_endpoint":"http://a.example/t"})", false},
@@ -92,11 +88,11 @@ TEST(ProviderAddressesTest, AreOfTheIssuerAndEncrypted)
         {"[]", false},
         {"", false},
     };
-    for (const auto& each : kTexts) {
+    for (const auto& [text, isGood] : kTexts) {
         ProviderAddresses addresses;
-        EXPECT_EQ(ProviderAddresses::parse(each.text, QStringLiteral("i"), addresses).good(), each.isGood)
-            << each.text.constData();
-        EXPECT_EQ(addresses.token.isEmpty(), !each.isGood);
+        EXPECT_EQ(ProviderAddresses::parse(text, QStringLiteral("i"), addresses).good(), isGood)
+            << text.constData();
+        EXPECT_EQ(addresses.token.isEmpty(), !isGood);
     }
 }
 

@@ -122,27 +122,23 @@ TEST_F(SignInTest, LeadsThroughTheProviderToWhereOneWanted)
 TEST_F(SignInTest, LetsNobodyInWithWhatIsNotHis)
 {
     start();
-    const auto claims = [](const char* name, const QJsonValue& value) {
-        return [=](QJsonObject made) {
-            made.insert(QLatin1String(name), value);
-            return made;
+    const std::pair<QString, QJsonValue> kClaims[] = {
+        {QStringLiteral("nonce"), QStringLiteral("other")},
+        {QStringLiteral("nonce"), QJsonValue()},
+        {QStringLiteral("aud"), QStringLiteral("archive")},
+        {QStringLiteral("aud"), QJsonArray{QStringLiteral("kdd"), QStringLiteral("other")}},
+        {QStringLiteral("azp"), QStringLiteral("other")},
+        {QStringLiteral("iss"), QStringLiteral("https://other.example")},
+        {QStringLiteral("exp"), 1000},
+        {QStringLiteral("sub"), QString()},
+        {QStringLiteral("sub"), QString(300, QLatin1Char('a'))},
+    };
+    for (const auto& claim : kClaims) {
+        mProvider.sign = [&](QJsonObject made) {
+            made.insert(claim.first, claim.second);
+            return mProvider.issuer.token(made);
         };
-    };
-    using Change = std::function<QJsonObject(QJsonObject)>;
-    const QVector<Change> kClaims = {
-        claims("nonce", QStringLiteral("other")),
-        claims("nonce", QJsonValue()),
-        claims("aud", QStringLiteral("archive")),
-        claims("aud", QJsonArray{QStringLiteral("kdd"), QStringLiteral("other")}),
-        claims("azp", QStringLiteral("other")),
-        claims("iss", QStringLiteral("https://other.example")),
-        claims("exp", 1000),
-        claims("sub", QString()),
-        claims("sub", QString(300, QLatin1Char('a'))),
-    };
-    for (const Change& change : kClaims) {
-        mProvider.sign = [&](const QJsonObject& made) { return mProvider.issuer.token(change(made)); };
-        EXPECT_EQ(signIn().status, 403);
+        EXPECT_EQ(signIn().status, 403) << claim.first.toStdString();
     }
     mProvider.sign = [](const QJsonObject& made) {
         return base64Url(R"({"alg":"none"})") + '.' + base64Url(TokenIssuer::text(made)) + '.';
@@ -152,12 +148,7 @@ TEST_F(SignInTest, LetsNobodyInWithWhatIsNotHis)
     mProvider.sign = [&](const QJsonObject& made) { return other.token(made); };
     EXPECT_EQ(signIn().status, 403);
     mProvider.sign = nullptr;
-    const struct
-    {
-        const char* from;
-        const char* to;
-        int status;
-    } kCallbacks[] = {
+    const std::tuple<const char*, const char*, int> kCallbacks[] = {
         {"state=", "state=x", 400},
         {"&state=", "&stat=", 400},
         {"?code=", "?code=x&code=", 400},
@@ -165,8 +156,8 @@ TEST_F(SignInTest, LetsNobodyInWithWhatIsNotHis)
         {"?code=", "?error=access_denied&c=", 403},
         {"?code=", "?code=x", 403},
     };
-    for (const auto& each : kCallbacks)
-        EXPECT_EQ(status("GET", backFrom().replace(each.from, each.to)), each.status) << each.to;
+    for (const auto& [from, to, expected] : kCallbacks)
+        EXPECT_EQ(status("GET", backFrom().replace(from, to)), expected) << to;
     const QByteArray back = backFrom();
     const QMap<QByteArray, QByteArray> begun = mCookies;
     mCookies.clear();
@@ -184,21 +175,17 @@ TEST_F(SignInTest, LetsNobodyInWithWhatIsNotHis)
 TEST_F(SignInTest, LeadsNowhereElse)
 {
     start();
-    const struct
-    {
-        const char* to;
-        const char* leads;
-    } kPlaces[] = {
+    const std::pair<const char*, const char*> kPlaces[] = {
         {"/viewer/?a=b", "/viewer/?a=b"}, {"", "/"},
         {"https://evil.example/", "/"},   {"//evil.example/", "/"},
         {"/\\evil.example", "/"},         {"viewer", "/"},
         {"@evil.example/", "/"},          {"/a\r\nX: y", "/"},
         {"javascript:alert(1)", "/"},
     };
-    for (const auto& each : kPlaces) {
+    for (const auto& [to, leads] : kPlaces) {
         mCookies.clear();
-        const Reply in = ask("GET", backFrom("/signin?to=" + QByteArray(each.to).toPercentEncoding()));
-        EXPECT_EQ(in.header("Location"), QByteArray("http://localhost") + each.leads) << each.to;
+        const Reply in = ask("GET", backFrom("/signin?to=" + QByteArray(to).toPercentEncoding()));
+        EXPECT_EQ(in.header("Location"), QByteArray("http://localhost") + leads) << to;
     }
     EXPECT_TRUE(ask("GET", backFrom("/signin?to=/" + QByteArray(3000, 'a')))
                     .header("Location")
@@ -211,11 +198,7 @@ TEST_F(SignInTest, ChangesNothingForPagesOfOthers)
     start();
     signIn();
     const QByteArray sent = anImage("1.2.3.1").file();
-    const struct
-    {
-        const char* headers;
-        int status;
-    } kOrigins[] = {
+    const std::pair<const char*, int> kOrigins[] = {
         {"", 403},
         {"Origin: https://evil.example\r\n", 403},
         {"Origin: null\r\n", 403},
@@ -225,11 +208,11 @@ TEST_F(SignInTest, ChangesNothingForPagesOfOthers)
         {"X-Requested-With: fetch\r\n", 200},
         {"Origin: http://localhost\r\n", 200},
     };
-    for (const auto& each : kOrigins) {
-        const QByteArray headers = QByteArray(each.headers) + "Content-Type: application/dicom\r\n";
-        EXPECT_EQ(ask("POST", "/dicom-web/studies", headers, sent).status, each.status) << each.headers;
-        EXPECT_EQ(QDir(mStore.filePath("objects/1.2")).exists(), each.status == 200) << each.headers;
-        EXPECT_EQ(status("GET", "/browser/config", each.headers), 200) << each.headers;
+    for (const auto& [origin, expected] : kOrigins) {
+        const QByteArray headers = QByteArray(origin) + "Content-Type: application/dicom\r\n";
+        EXPECT_EQ(ask("POST", "/dicom-web/studies", headers, sent).status, expected) << origin;
+        EXPECT_EQ(QDir(mStore.filePath("objects/1.2")).exists(), expected == 200) << origin;
+        EXPECT_EQ(status("GET", "/browser/config", origin), 200) << origin;
     }
     EXPECT_TRUE(ask("GET", "/browser/config").body.contains(R"("may":["store"])"));
     EXPECT_EQ(status("POST", "/signout"), 403);

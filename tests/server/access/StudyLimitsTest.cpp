@@ -1,6 +1,7 @@
 #include "server/ServerFixture.h"
 #include "server/access/RightsTable.h"
 #include "server/access/TokenIssuer.h"
+#include "support/CorrectionJob.h"
 
 #include <QDir>
 
@@ -10,8 +11,6 @@ using namespace Kdd::Access;
 namespace
 {
 
-constexpr qint64 kFarAway = 4'000'000'000;  // [s since 1970]
-
 /// An archive of a study "1.2" of North and one "1.9" of South, and those who may see what is North's only.
 class StudyLimits : public ServerFixture
 {
@@ -19,28 +18,20 @@ protected:
     StudyLimits()
     {
         QDir().mkpath(mStore.filePath("images"));
-        save("north", anImage("1.2.3.1").with(DCM_InstitutionName, "North").with(DCM_PatientName, "A"));
+        save("north", anImage("1.2.3.1").with("InstitutionName=North|PatientName=A"));
         save("south", southern("1.9.3.1"));
-        kdd({QStringLiteral("add"), mStore.filePath("images")});
+        kdd("add " + mStore.filePath("images").toUtf8());
         takeObjects();
         mSettings.changes.corrections = mSettings.changes.deletions = true;
-        putFile(mStore.filePath("keys.json"), mIssuer.keySet());
-        const QByteArray file =
-            R"({"tokens":{"issuer":"https://login.example","audience":"archive","keys":")" +
-            mStore.filePath("keys.json").toUtf8() +
-            R"(","rights":[{"gives":["read","store","correct","delete"]}],)" +
-            R"("studies":[{"claim":"sites","attribute":"InstitutionName"}]}})";
-        EXPECT_EQ(AccessRules::parse(file, mSettings.access.emplace()).text(), QString());
+        mSettings.access =
+            mIssuer.rules(mStore.folder(), R"("rights":[{"gives":["read","store","correct","delete"]}],)"
+                                           R"("studies":[{"claim":"sites","attribute":"InstitutionName"}])");
         start();
     }
 
     static DatasetBuilder southern(const char* uid)
     {
-        return anImage(uid)
-            .inStudy("1.9")
-            .inSeries("1.9.3")
-            .with(DCM_PatientID, "7")
-            .with(DCM_InstitutionName, "South");
+        return anImage(uid).inStudy("1.9").inSeries("1.9.3").with("PatientID=7|InstitutionName=South");
     }
     void save(const char* name, const DatasetBuilder& image) const
     {
@@ -49,7 +40,7 @@ protected:
     /// A header with a token of the sites; without sites it has no such claim.
     QByteArray token(const QJsonValue& sites) const
     {
-        QJsonObject claims = TokenIssuer::claimsWith("exp", kFarAway);
+        QJsonObject claims = TokenIssuer::lastingClaims();
         if (!sites.isUndefined())
             claims.insert(QStringLiteral("sites"), sites);
         return "Authorization: Bearer " + mIssuer.token(claims) + "\r\n";
@@ -123,11 +114,7 @@ TEST_F(StudyLimits, AnswerOfEveryResourceAsIfOthersDidNotExist)
 
 TEST_F(StudyLimits, FollowTheClaim)
 {
-    const struct
-    {
-        QJsonValue sites;
-        const char* studies;
-    } kClaims[] = {
+    const std::pair<QJsonValue, const char*> kClaims[] = {
         {QStringLiteral("North"), "1.2"},
         {QJsonArray{QStringLiteral("South"), QStringLiteral("Nowhere")}, "1.9"},
         {QJsonArray{QStringLiteral("South"), QStringLiteral("North")}, "1.2 1.9"},
@@ -141,8 +128,8 @@ TEST_F(StudyLimits, FollowTheClaim)
         {7, ""},
         {QJsonValue(QJsonValue::Undefined), ""},
     };
-    for (const auto& each : kClaims) {
-        const QByteArray headers = token(each.sites);
+    for (const auto& [sites, studies] : kClaims) {
+        const QByteArray headers = token(sites);
         QByteArrayList found;
         for (const QByteArray study : {"1.2", "1.9"}) {
             const int status = ask("GET", "/dicom-web/studies/" + study + "/metadata", headers).status;
@@ -152,7 +139,7 @@ TEST_F(StudyLimits, FollowTheClaim)
             if (isListed)
                 found << study;
         }
-        EXPECT_EQ(found.join(' ').toStdString(), each.studies);
+        EXPECT_EQ(found.join(' ').toStdString(), studies);
     }
     QJsonArray many;
     for (int i = 0; i < 500; ++i)
@@ -183,11 +170,8 @@ TEST_F(StudyLimits, FollowCorrectionsAndArrivals)
     EXPECT_TRUE(get("/dicom-web/studies", north).contains("\"5\"")) << "at once";
     EXPECT_EQ(ask("GET", "/dicom-web/studies/5/metadata", north).status, 200);
     const QByteArray tag = ask("GET", "/dicom-web/studies/1.2/metadata", north).header("ETag");
-    putFile(mStore.filePath("job.xml"),
-            "<Job><Timestamp>20240601093000</Timestamp><Login>anna</Login><Substitutions><Tag Group=\"0008\" "
-            "Element=\"0080\"><Value>South</Value></Tag></Substitutions></Job>");
-    kdd({QStringLiteral("qa"), mStore.filePath("job.xml"), QStringLiteral("--study"), QStringLiteral("1.2"),
-         QStringLiteral("--image"), QStringLiteral("1.2.3.1")});
+    putFile(mStore.filePath("job.xml"), jobXml(DCM_InstitutionName, "South"));
+    kdd("qa " + mStore.filePath("job.xml").toUtf8() + " --study 1.2 --image 1.2.3.1");
     EXPECT_EQ(ask("GET", "/dicom-web/studies/1.2/metadata", north + "If-None-Match: " + tag + "\r\n").status,
               404);
     EXPECT_EQ(get("/dicom-web/studies/1.2/series", north), "[]");
@@ -197,11 +181,8 @@ TEST_F(StudyLimits, KeepMovedImagesInSight)
 {
     const auto move = [&](const QByteArray& from, const QByteArray& to, const char* preview,
                           const QByteArray& headers) {
-        const QByteArray job =
-            "<Job><Timestamp>20240601093000</Timestamp><Login>anna</Login><Substitutions OldSUID=\"" + from +
-            "\"><Tag Group=\"0020\" Element=\"000D\"><Value>" + to + "</Value></Tag></Substitutions></Job>";
-        return ask("POST", "/dicom-web/studies/1.2/corrections?all=true" + QByteArray(preview), headers, job,
-                   "application/xml")
+        return ask("POST", "/dicom-web/studies/1.2/corrections?all=true" + QByteArray(preview), headers,
+                   jobXml(DCM_StudyInstanceUID, to, from), "application/xml")
             .status;
     };
     const QByteArray north = token(QStringLiteral("North"));
@@ -218,11 +199,7 @@ TEST_F(StudyLimits, AreRefusedWhereTheyKeepNothing)
 {
     const QByteArray begin =
         R"({"tokens":{"issuer":"i","audience":"a","keys":"k","rights":[{"gives":["read"]}],)";
-    const struct
-    {
-        QByteArray text;
-        const char* fault;
-    } kFiles[] = {
+    const std::pair<QByteArray, const char*> kFiles[] = {
         {begin + R"("studies":[{"claim":"c","attribute":"ReferringPhysicianName"}]}})", ""},
         {begin + R"("studies":[{"claim":"c","attribute":"0020000D"}]}})", ""},
         {begin + R"("studies":[{"claim":"c","attribute":"InstitutionNam"}]}})", "no attribute by which"},
@@ -233,11 +210,10 @@ TEST_F(StudyLimits, AreRefusedWhereTheyKeepNothing)
         {begin + R"("studies":[]}})", "tokens.studies is no list"},
         {begin + R"("studies":[{"claim":"c","attribute":"StudyID"}]},"anyone":["read"]})", "keeps nothing"},
     };
-    for (const auto& each : kFiles) {
+    for (const auto& [text, expected] : kFiles) {
         AccessRules rules;
-        const std::string fault = AccessRules::parse(each.text, rules).text().toStdString();
-        EXPECT_TRUE(*each.fault == '\0' ? fault.empty() : fault.find(each.fault) != std::string::npos)
-            << fault;
+        const std::string fault = AccessRules::parse(text, rules).text().toStdString();
+        EXPECT_TRUE(*expected == '\0' ? fault.empty() : fault.find(expected) != std::string::npos) << fault;
     }
 }
 

@@ -71,7 +71,7 @@ private:
                             code.value(QStringLiteral("redirect_uri")) == field("redirect_uri");
         if (!isGood)
             return {httpResponse(R"({"error":"invalid_grant"})", "400 Bad Request")};
-        QJsonObject claims = TokenIssuer::claimsWith("exp", qint64(4'000'000'000));
+        QJsonObject claims = TokenIssuer::lastingClaims();
         claims.insert(QStringLiteral("iss"), QString::fromLatin1(url()));
         claims.insert(QStringLiteral("aud"), QStringLiteral("kdd"));
         claims.insert(QStringLiteral("nonce"), code.value(QStringLiteral("nonce")));

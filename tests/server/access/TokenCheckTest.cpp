@@ -75,12 +75,7 @@ TEST_F(TokenCheckTest, TakesWhatTheIssuerSigned)
 
 TEST_F(TokenCheckTest, GivesWhatTheClaimsSay)
 {
-    const struct
-    {
-        const char* name;
-        QJsonValue value;
-        const char* verdict;
-    } kClaims[] = {
+    const std::tuple<const char*, QJsonValue, const char*> kClaims[] = {
         {"scope", QStringLiteral("images.reader"), "anna 0"},
         {"scope", QStringLiteral("images.*"), "anna 0"},
         {"scope", QJsonArray{QStringLiteral("x"), QStringLiteral("images.read")}, "anna 1"},
@@ -90,19 +85,12 @@ TEST_F(TokenCheckTest, GivesWhatTheClaimsSay)
         {"realm.roles", QStringLiteral("qa"), "anna 5"},
         {"realm", QStringLiteral("qa"), "anna 1"},
     };
-    for (const auto& each : kClaims)
-        EXPECT_EQ(check(issuer().token(TokenIssuer::claimsWith(each.name, each.value))), each.verdict)
-            << each.name;
+    for (const auto& [name, value, verdict] : kClaims)
+        EXPECT_EQ(check(issuer().token(TokenIssuer::claimsWith(name, value))), verdict) << name;
 }
 
-struct BadToken
-{
-    const char* name;
-    QByteArray token;
-    const char* fault;
-};
-
-std::vector<BadToken> badTokens()
+/// By name, and what is said of each.
+std::vector<std::tuple<const char*, QByteArray, const char*>> badTokens()
 {
     const auto with = [](const char* name, const QJsonValue& value) {
         return issuer().token(TokenIssuer::claimsWith(name, value));
@@ -181,8 +169,8 @@ std::vector<BadToken> badTokens()
 
 TEST_F(TokenCheckTest, TakesNothingElse)
 {
-    for (const BadToken& bad : badTokens())
-        EXPECT_EQ(check(bad.token), bad.fault) << bad.name;
+    for (const auto& [name, token, fault] : badTokens())
+        EXPECT_EQ(check(token), fault) << name;
     EXPECT_EQ(mLog.count("anna"), 0);
 }
 

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "server/access/AccessRules.h"
 #include "support/FileContent.h"
 
 #include <QJsonArray>
@@ -14,6 +15,9 @@ namespace Kdd::Access
 {
 
 constexpr qint64 kNow = 1'800'000'000;  // [s since 1970]
+
+/// What tokens give whose scope is to read.
+const QByteArray kReaders = R"("rights":[{"claim":"scope","value":"images.read","gives":["read"]}])";
 
 inline QByteArray base64Url(const QByteArray& bytes)
 {
@@ -45,6 +49,9 @@ public:
         made.insert(QLatin1String(name), value);
         return made;
     }
+    /// Whatever the clock says.
+    static QJsonObject lastingClaims() { return claimsWith("exp", qint64(4'000'000'000)); }
+
     static QByteArray text(const QJsonObject& object)
     {
         return QJsonDocument(object).toJson(QJsonDocument::Compact);
@@ -98,6 +105,19 @@ public:
     }
     static QByteArray keySet(const QJsonArray& keys) { return text({{QStringLiteral("keys"), keys}}); }
     QByteArray keySet() const { return keySet({rsaKey(), ecKey()}); }
+
+    /// Those of a server that takes its tokens, by keys that lie in the folder then; `more` says what the tokens give.
+    AccessRules rules(const QString& folder, const QByteArray& more) const
+    {
+        const QString file = folder + QStringLiteral("/keys.json");
+        putFile(file, keySet());
+        AccessRules made;
+        const QByteArray text =
+            R"({"tokens":{"issuer":"https://login.example","audience":"archive","keys":")" + file.toUtf8() +
+            "\"," + more + "}}";
+        EXPECT_EQ(AccessRules::parse(text, made).text(), QString());
+        return made;
+    }
 
     /// Runs the tool in the folder of the keys.
     QByteArray openssl(const QByteArray& arguments, const QByteArray& input = {}) const

@@ -1,11 +1,10 @@
 #pragma once
 
+#include "server/Handled.h"
 #include "server/browser/BrowserService.h"
 #include "support/DatasetBuilder.h"
+#include "support/Json.h"
 #include "support/TemporaryStore.h"
-
-#include <QJsonArray>
-#include <QJsonDocument>
 
 #include <gtest/gtest.h>
 #include <kddlib/TagFile.h>
@@ -27,53 +26,40 @@ protected:
         ASSERT_TRUE(file.writeCacheFile());
     }
 
-    Http::Response get(const QByteArray& target, const QVector<Http::Field>& headers = {},
+    Http::Response get(const QByteArray& target, const Headers& headers = {},
                        Http::Method method = Http::Method::Get)
     {
-        Http::Request request;
-        request.method = method;
-        request.headers = headers;
-        const QList<QByteArray> parts = target.split('?');
-        for (const QByteArray& segment : parts[0].split('/'))
-            if (!segment.isEmpty())
-                request.path.append(segment);
-        for (const QByteArray& one : parts.value(1).split('&'))
-            request.query.append({one.split('=').value(0), one.split('=').value(1)});
-        return mService.answer(request);
+        return mService.answer(requestFor(target, headers, method));
     }
 
-    static QByteArray bodyOf(const Http::Response& response)
-    {
-        return response.body.empty() ? QByteArray() : std::get<QByteArray>(response.body[0]);
-    }
-
-    static QByteArray header(const Http::Response& response, const QByteArray& name)
-    {
-        for (const Http::Field& field : response.headers)
-            if (field.name == name)
-                return field.value;
-        return {};
-    }
-
-    QJsonObject json(const QByteArray& target)
+    QJsonValue json(const QByteArray& target, const QByteArray& place = {})
     {
         const Http::Response response = get(target);
         EXPECT_EQ(response.status, 200) << target.constData() << ": " << bodyOf(response).constData();
-        return QJsonDocument::fromJson(bodyOf(response)).object();
+        return jsonAt(bodyOf(response), place);
+    }
+
+    /// What is told of the study, its "/corrections" for example.
+    QJsonValue told(const QByteArray& below, const QByteArray& place)
+    {
+        return json("/browser/studies/1.2" + below, place);
+    }
+    std::string text(const QByteArray& below, const QByteArray& place)
+    {
+        return told(below, place).toString().toStdString();
     }
 
     /// The entry of the tag among attributes, differences or changes.
-    static QJsonObject entry(const QJsonValue& list, const char* tag)
+    static QJsonValue entry(const QJsonValue& list, const char* tag)
     {
         for (const QJsonValue& one : list.toArray())
-            if (one[QStringLiteral("tag")] == QLatin1String(tag))
-                return one.toObject();
-        return {};
+            if (jsonAt(one, "tag") == QLatin1String(tag))
+                return one;
+        return QJsonValue::Undefined;
     }
-
-    static std::string text(const QJsonObject& object, const char* name)
+    QJsonValue attribute(const QByteArray& image, const char* tag)
     {
-        return object[QLatin1String(name)].toString().toStdString();
+        return entry(told("/images/" + image + "/attributes", "attributes"), tag);
     }
 
     TemporaryStore mStore;

@@ -16,22 +16,9 @@ using namespace Kdd::Browser;
 namespace
 {
 
-QString attributesOf(const QString& tag, const QJsonObject& tree)
+DatasetBuilder image(const char* uid, const char* series, const QByteArray& number)
 {
-    for (const QJsonValue& one : tree[QStringLiteral("attributes")].toArray())
-        if (one[QStringLiteral("tag")] == tag)
-            return one[QStringLiteral("origin")].toString() +
-                   QLatin1String(one[QStringLiteral("hidden")].toBool() ? " hidden" : "");
-    return QStringLiteral("none");
-}
-
-DatasetBuilder image(const char* uid, const char* series, const char* number)
-{
-    return anImage(uid)
-        .inStudy("1.2")
-        .inSeries(series)
-        .with(DCM_InstanceNumber, number)
-        .with(DCM_PatientName, "Doe^Jane");
+    return anImage(uid).inSeries(series).with("PatientName=Doe^Jane|InstanceNumber=" + number);
 }
 
 /// Two series; only the last image lacks the description, and has another item than the others.
@@ -56,17 +43,15 @@ QVector<DatasetBuilder> study()
                 .withItem(DCM_ReferencedImageSequence, item("1.8"))};
 }
 
-struct Origin
-{
-    const char* image;
-    const char* tag;
-    const char* origin;
-};
-
-const Origin kOrigins[] = {
-    {"1.4.1", "00100010", "study"}, {"1.4.4", "0008103E", "series"},       {"1.4.2", "00200013", "image"},
-    {"1.4.1", "00081030", "study"}, {"1.4.5", "00081030", "image hidden"}, {"1.4.1", "00080018", "image"},
-    {"1.4.1", "00104000", "none"},  {"1.4.1", "00067100", "none"},
+const std::tuple<const char*, const char*, const char*> kOrigins[] = {
+    {"1.4.1", "00100010", "study"},
+    {"1.4.4", "0008103E", "series"},
+    {"1.4.2", "00200013", "image"},
+    {"1.4.1", "00081030", "study"},
+    {"1.4.5", "00081030", "image hidden"},
+    {"1.4.1", "00080018", "image"},
+    {"1.4.1", "00104000", ""},
+    {"1.4.1", "00067100", ""},
 };
 
 }  // namespace
@@ -74,10 +59,10 @@ const Origin kOrigins[] = {
 TEST_F(BrowserTest, TellsWhichNodeHoldsEachValue)
 {
     write(study());
-    for (const Origin& one : kOrigins) {
-        const QJsonObject tree = json(QByteArray("/browser/studies/1.2/images/") + one.image + "/attributes");
-        EXPECT_EQ(attributesOf(QLatin1String(one.tag), tree).toStdString(), one.origin)
-            << one.image << ' ' << one.tag;
+    for (const auto& [uid, tag, origin] : kOrigins) {
+        const QJsonValue held = attribute(uid, tag);
+        EXPECT_EQ(textAt(held, "origin") + (jsonAt(held, "hidden").toBool() ? " hidden" : ""), origin)
+            << uid << ' ' << tag;
     }
 }
 
@@ -94,43 +79,35 @@ TEST_F(BrowserTest, ShowsOfImagesThatDifferWhatSearchesShow)
     put("1.4.2", "Doe^J", "/d/a");
     file.optimizeAll();
     ASSERT_TRUE(file.writeCacheFile());
-    const QJsonObject attributes = json("/browser/studies/1.2")[QStringLiteral("attributes")].toObject();
-    EXPECT_EQ(text(attributes, "PatientName"), builtStudy(file).search.patientName.toStdString());
-    EXPECT_EQ(text(attributes, "PatientName"), "Doe^J");
+    EXPECT_EQ(text("", "attributes/PatientName"), builtStudy(file).search.patientName.toStdString());
+    EXPECT_EQ(text("", "attributes/PatientName"), "Doe^J");
 }
 
 TEST_F(BrowserTest, TellsWhichNodesItemHoldsAValueInside)
 {
     write(study());
-    const auto item = [this](const char* uid) {
-        const QJsonObject tree = json(QByteArray("/browser/studies/1.2/images/") + uid + "/attributes");
-        const QJsonObject sequence = entry(tree[QStringLiteral("attributes")], "00081140");
-        EXPECT_EQ(sequence[QStringLiteral("count")].toInt(), 1);
-        return sequence[QStringLiteral("items")][0];
+    const auto inside = [this](const char* uid, const char* tag) {
+        EXPECT_EQ(jsonAt(attribute(uid, "00081140"), "count"), 1);
+        const QJsonValue one = entry(jsonAt(attribute(uid, "00081140"), "items/0"), tag);
+        return textAt(one, "value") + ' ' + textAt(one, "origin");
     };
-    EXPECT_EQ(text(entry(item("1.4.5"), "00081155"), "value"), "1.8");
-    EXPECT_EQ(text(entry(item("1.4.5"), "00081155"), "origin"), "image");
-    EXPECT_EQ(text(entry(item("1.4.5"), "00081150"), "value"), "1.2.840");
-    EXPECT_EQ(text(entry(item("1.4.1"), "00081155"), "value"), "1.7");
-    EXPECT_NE(text(entry(item("1.4.1"), "00081155"), "origin"), "image");
+    EXPECT_EQ(inside("1.4.5", "00081155"), "1.8 image");
+    EXPECT_EQ(inside("1.4.5", "00081150").substr(0, 8), "1.2.840 ");
+    EXPECT_EQ(inside("1.4.1", "00081155").substr(0, 4), "1.7 ");
+    EXPECT_NE(inside("1.4.1", "00081155"), "1.7 image");
 }
 
 TEST_F(BrowserTest, ListsImagesByNumberInPieces)
 {
     write(study());
-    const QJsonObject list = json("/browser/studies/1.2/series/1.3.2/images?offset=1&limit=2");
-    EXPECT_EQ(list[QStringLiteral("count")].toInt(), 4);
-    ASSERT_EQ(list[QStringLiteral("images")].toArray().size(), 2);
-    EXPECT_EQ(list[QStringLiteral("images")][0][QStringLiteral("key")].toString(), QStringLiteral("1.4.4"));
+    const QJsonValue list = told("/series/1.3.2/images?offset=1&limit=2", "");
+    EXPECT_EQ(jsonAt(list, "count"), 4);
+    ASSERT_EQ(jsonAt(list, "images").toArray().size(), 2);
+    EXPECT_EQ(textAt(list, "images/0/key"), "1.4.4");
     for (const char* odd : {"offset=-1", "offset=99", "offset=2147483647", "limit=x"})
-        EXPECT_LE(
-            json(QByteArray("/browser/studies/1.2/series/1.3.2/images?") + odd)[QStringLiteral("images")]
-                .toArray()
-                .size(),
-            4);
-    const QJsonObject first = json("/browser/studies/1.2/images/1.4.2/attributes");
-    EXPECT_TRUE(first[QStringLiteral("previous")].isNull());
-    EXPECT_EQ(text(first, "next"), "1.4.1");
+        EXPECT_LE(told(QByteArray("/series/1.3.2/images?") + odd, "images").toArray().size(), 4);
+    EXPECT_TRUE(told("/images/1.4.2/attributes", "previous").isNull());
+    EXPECT_EQ(text("/images/1.4.2/attributes", "next"), "1.4.1");
 }
 
 TEST_F(BrowserTest, CutsWhatIsTooMuchAndSaysSo)
@@ -138,7 +115,7 @@ TEST_F(BrowserTest, CutsWhatIsTooMuchAndSaysSo)
     DatasetBuilder item = anItem();
     for (unsigned short i = 0; i < 25; ++i)
         item.with(DcmTag(0x0018, static_cast<unsigned short>(0x9000 + i), EVR_LO), "value");
-    DatasetBuilder image = anImage("1.4").inStudy("1.2").inSeries("1.3");
+    DatasetBuilder image = anImage("1.4");
     for (int i = 0; i < kMaxShownItems + 3; ++i)
         image.withItem(DCM_ReferencedImageSequence, item);
     image.withLong(DCM_TextValue, kMaxValueLength + 500);
@@ -146,20 +123,19 @@ TEST_F(BrowserTest, CutsWhatIsTooMuchAndSaysSo)
     file.addTagMap(image.map(1 << 20), nullptr, true);
     ASSERT_TRUE(file.writeCacheFile());
 
-    const QJsonObject tree = json("/browser/studies/1.2/images/1.4/attributes");
-    EXPECT_FALSE(tree[QStringLiteral("complete")].toBool());
-    const QJsonObject sequence = entry(tree[QStringLiteral("attributes")], "00081140");
-    EXPECT_EQ(sequence[QStringLiteral("count")].toInt(), kMaxShownItems + 3);
-    EXPECT_LE(sequence[QStringLiteral("items")].toArray().size(), kMaxTreeEntries / 25);
+    EXPECT_EQ(told("/images/1.4/attributes", "complete"), false);
+    const QJsonValue sequence = attribute("1.4", "00081140");
+    EXPECT_EQ(jsonAt(sequence, "count"), kMaxShownItems + 3);
+    EXPECT_LE(jsonAt(sequence, "items").toArray().size(), kMaxTreeEntries / 25);
     // It comes after the sequence, and is there all the same.
-    const QJsonObject value = entry(tree[QStringLiteral("attributes")], "0040A160");
-    EXPECT_EQ(value[QStringLiteral("value")].toString().size(), kMaxValueLength);
-    EXPECT_EQ(value[QStringLiteral("length")].toInt(), kMaxValueLength + 500);
+    const QJsonValue value = attribute("1.4", "0040A160");
+    EXPECT_EQ(jsonAt(value, "value").toString().size(), kMaxValueLength);
+    EXPECT_EQ(jsonAt(value, "length"), kMaxValueLength + 500);
 }
 
 TEST_F(BrowserTest, GivesNoMoreAtOnceThanPeopleLookAt)
 {
-    DatasetBuilder full = anImage("1.4").inStudy("1.2").inSeries("1.3");
+    DatasetBuilder full = anImage("1.4");
     for (unsigned short i = 0; i < kMaxDifferences + 1; ++i)
         full.with(
             DcmTag(i < 0x1000 ? 0x0018 : 0x0020, static_cast<unsigned short>(0x8000 + i % 0x1000), EVR_LO),
@@ -168,39 +144,31 @@ TEST_F(BrowserTest, GivesNoMoreAtOnceThanPeopleLookAt)
     file.addTagMap(full.map(), nullptr, true);
     // In a series of their own: what many images of one have to tell apart takes its time.
     for (int i = 0; i <= kMaxListedImages; ++i)
-        file.addTagMap(anImage(("1.5." + std::to_string(i)).c_str()).inStudy("1.2").inSeries("1.6").map(),
-                       nullptr, true);
+        file.addTagMap(anImage(("1.5." + std::to_string(i)).c_str()).inSeries("1.6").map(), nullptr, true);
     ASSERT_TRUE(file.writeCacheFile());
-    const QJsonObject listed = json("/browser/studies/1.2/series/1.6/images?limit=5000");
-    EXPECT_EQ(listed[QStringLiteral("images")].toArray().size(), kMaxListedImages);
-    EXPECT_EQ(listed[QStringLiteral("count")].toInt(), kMaxListedImages + 1);
-    const QJsonObject found = json("/browser/studies/1.2/difference?a=1.4&b=1.5.1");
-    EXPECT_EQ(found[QStringLiteral("differences")].toArray().size(), kMaxDifferences);
-    EXPECT_FALSE(found[QStringLiteral("complete")].toBool(true));
+    const QJsonValue listed = told("/series/1.6/images?limit=5000", "");
+    EXPECT_EQ(jsonAt(listed, "images").toArray().size(), kMaxListedImages);
+    EXPECT_EQ(jsonAt(listed, "count"), kMaxListedImages + 1);
+    const QJsonValue found = told("/difference?a=1.4&b=1.5.1", "");
+    EXPECT_EQ(jsonAt(found, "differences").toArray().size(), kMaxDifferences);
+    EXPECT_EQ(jsonAt(found, "complete"), false);
 }
 
 TEST_F(BrowserTest, DecodesTextsByTheCharacterSetOfTheirImage)
 {
-    write({anImage("1.4")
-               .inStudy("1.2")
-               .with(DCM_SpecificCharacterSet, "ISO_IR 100")
-               .with(DCM_PatientName, "M\xfcller")});
-    EXPECT_EQ(text(json("/browser/studies/1.2")[QStringLiteral("attributes")].toObject(), "PatientName"),
-              "Müller");
+    write({anImage("1.4").with("SpecificCharacterSet=ISO_IR 100|PatientName=M\xfcller")});
+    EXPECT_EQ(text("", "attributes/PatientName"), "Müller");
 }
 
 TEST_F(BrowserTest, TellsInWhatImagesDiffer)
 {
     write(study());
-    const QJsonObject answer = json("/browser/studies/1.2/difference?a=1.4.4&b=1.4.5");
-    const QJsonValue list = answer[QStringLiteral("differences")];
+    const QJsonValue list = told("/difference?a=1.4.4&b=1.4.5", "differences");
     EXPECT_EQ(list.toArray().size(), 4);  // own UID, number, description, the item's UID
-    EXPECT_TRUE(entry(list, "00081030")[QStringLiteral("b")].isNull());
-    EXPECT_EQ(text(entry(list, "00081155"), "path"), "(0008,1140)[0].");
-    EXPECT_EQ(text(entry(list, "00081155")[QStringLiteral("b")].toObject(), "value"), "1.8");
-    EXPECT_TRUE(json("/browser/studies/1.2/difference?a=1.4.4&b=1.4.4")[QStringLiteral("differences")]
-                    .toArray()
-                    .isEmpty());
+    EXPECT_TRUE(jsonAt(entry(list, "00081030"), "b").isNull());
+    EXPECT_EQ(textAt(entry(list, "00081155"), "path"), "(0008,1140)[0].");
+    EXPECT_EQ(textAt(entry(list, "00081155"), "b/value"), "1.8");
+    EXPECT_EQ(told("/difference?a=1.4.4&b=1.4.4", "differences"), QJsonArray());
 }
 
 TEST_F(BrowserTest, TellsACorrectionOnceForAllItsImages)
@@ -214,15 +182,14 @@ TEST_F(BrowserTest, TellsACorrectionOnceForAllItsImages)
     job.substitutions = {{DCM_PatientName, QStringLiteral("<b>New")}};
     QString message;
     ASSERT_TRUE(TagFile::applyQA(job, message)) << qPrintable(message);
-    const QJsonArray corrections =
-        json("/browser/studies/1.2/corrections")[QStringLiteral("corrections")].toArray();
-    ASSERT_EQ(corrections.size(), 1);
-    EXPECT_EQ(corrections[0][QStringLiteral("count")].toInt(), 2);
-    EXPECT_TRUE(corrections[0][QStringLiteral("time")].toString().endsWith(QStringLiteral("anna")));
-    const QJsonObject change = entry(corrections[0][QStringLiteral("changes")], "00100010");
-    EXPECT_EQ(text(change, "old"), "Doe^Jane");
-    EXPECT_EQ(text(change, "new"), "<b>New");
-    EXPECT_TRUE(json("/browser/studies/1.2")[QStringLiteral("corrected")].toBool());
+    ASSERT_EQ(told("/corrections", "corrections").toArray().size(), 1);
+    const QJsonValue correction = told("/corrections", "corrections/0");
+    EXPECT_EQ(jsonAt(correction, "count"), 2);
+    EXPECT_TRUE(jsonAt(correction, "time").toString().endsWith(QStringLiteral("anna")));
+    const QJsonValue change = entry(jsonAt(correction, "changes"), "00100010");
+    EXPECT_EQ(textAt(change, "old"), "Doe^Jane");
+    EXPECT_EQ(textAt(change, "new"), "<b>New");
+    EXPECT_EQ(told("", "corrected"), true);
 }
 
 TEST_F(BrowserTest, TellsAVolumesGeometryInMillimetres)
@@ -239,13 +206,12 @@ TEST_F(BrowserTest, TellsAVolumesGeometryInMillimetres)
     info.preview = "\xff\xd8picture";
     file.addVolumeInfo({&info});
     ASSERT_TRUE(file.writeCacheFile());
-    const QJsonValue volume =
-        QJsonValue(json("/browser/studies/1.2"))[QStringLiteral("series")][0][QStringLiteral("volumes")][0];
-    EXPECT_EQ(volume[QStringLiteral("dims")].toArray(), (QJsonArray{512, 256, 2}));
-    EXPECT_EQ(volume[QStringLiteral("spacing")].toArray(), (QJsonArray{0.5, 0.25, 2}));
-    EXPECT_EQ(volume[QStringLiteral("origin")].toArray(), (QJsonArray{-10, -20, 30}));
-    EXPECT_EQ(volume[QStringLiteral("plane")].toString(), QStringLiteral("sagittal"));
-    EXPECT_EQ(volume[QStringLiteral("intercept")].toDouble(), -1024);
+    const QJsonValue volume = told("", "series/0/volumes/0");
+    EXPECT_EQ(jsonAt(volume, "dims"), (QJsonArray{512, 256, 2}));
+    EXPECT_EQ(jsonAt(volume, "spacing"), (QJsonArray{0.5, 0.25, 2}));
+    EXPECT_EQ(jsonAt(volume, "origin"), (QJsonArray{-10, -20, 30}));
+    EXPECT_EQ(jsonAt(volume, "plane"), QLatin1String("sagittal"));
+    EXPECT_EQ(jsonAt(volume, "intercept"), -1024);
     for (const char* target :
          {"/browser/studies/1.2/series/1.3.1/volumes/0/preview", "/browser/studies/1.2/preview"})
         EXPECT_EQ(bodyOf(get(target)), info.preview) << target;

@@ -16,9 +16,7 @@ const char* const kRenameXml =
     "<Job><Timestamp>20240131120000</Timestamp><Login>anna</Login><Substitutions>"
     "<Tag Group='0010' Element='0010'><Value>Roe^Jane</Value></Tag></Substitutions></Job>";
 
-class ChangeTest : public ChangedArchive
-{
-};
+using ChangeTest = ChangedArchive;
 
 TEST_F(ChangeTest, ShowsACorrectionInEveryAnswerAtOnce)
 {
@@ -45,17 +43,8 @@ TEST_F(ChangeTest, ShowsACorrectionInEveryAnswerAtOnce)
     EXPECT_THAT(feed("1.2"), testing::EndsWith("corrected"));
 }
 
-/// What is sent, and what it is answered with.
-struct Sent
-{
-    const char* query;
-    const char* type;
-    QByteArray body;
-    int status;
-    const char* reason;  // a part of it
-};
-
-const Sent kRefused[] = {
+/// What is sent, its type and body, and what it is answered with: the status and a part of the reason.
+const std::tuple<const char*, const char*, QByteArray, int, const char*> kRefused[] = {
     {"", "application/json", kRename, 400, "which images are meant"},
     {"?all=true", "application/x-www-form-urlencoded", kRename, 415, "application/json"},
     {"?all=true", "text/plain", kRename, 415, ""},
@@ -82,11 +71,10 @@ TEST_F(ChangeTest, RefusesWhatCannotBeDoneAndSaysWhy)
     start();
     storeStudy();
     const QByteArray before = get("/studies/1.2/metadata").body;
-    for (const Sent& sent : kRefused) {
-        const Reply reply =
-            ask("POST", QByteArray("/dicom-web/studies/1.2/corrections") + sent.query, sent.type, sent.body);
-        EXPECT_EQ(reply.status, sent.status) << sent.query << ' ' << sent.body.left(80).constData();
-        EXPECT_THAT(reply.body.toStdString(), testing::HasSubstr(sent.reason));
+    for (const auto& [query, type, body, status, reason] : kRefused) {
+        const Reply reply = ask("POST", QByteArray("/dicom-web/studies/1.2/corrections") + query, type, body);
+        EXPECT_EQ(reply.status, status) << query << ' ' << body.left(80).constData();
+        EXPECT_THAT(reply.body.toStdString(), testing::HasSubstr(reason)) << query;
         EXPECT_FALSE(reply.body.contains(mStore.folder().toUtf8()));
     }
     EXPECT_EQ(get("/studies/1.2/metadata").body, before);
@@ -152,11 +140,10 @@ TEST_F(ChangeTest, MovesImagesAndNamesTheNewStudy)
     storeStudy();
     const Reply reply = correct("1.2", "?series=1.2.3", R"({"tags":[{"tag":"0020000D","value":"1.5"}]})");
     ASSERT_EQ(reply.status, 200) << reply.body.constData();
-    const QJsonObject report = objectOf(reply);
-    EXPECT_EQ(report[QLatin1String("study")].toString(), QStringLiteral("1.5"));
-    EXPECT_EQ(report[QLatin1String("oldStudy")].toString(), QStringLiteral("1.2"));
-    EXPECT_EQ(report[QLatin1String("moved")].toInt(), 2);
-    EXPECT_THAT(report[QLatin1String("url")].toString().toStdString(), testing::EndsWith("/studies/1.5"));
+    EXPECT_EQ(textAt(reply.body, "study"), "1.5");
+    EXPECT_EQ(textAt(reply.body, "oldStudy"), "1.2");
+    EXPECT_EQ(textAt(reply.body, "moved"), "2");
+    EXPECT_THAT(textAt(reply.body, "url"), testing::EndsWith("/studies/1.5"));
     EXPECT_EQ(values("1.2", "00080018"), "1.2.4.1");
     EXPECT_EQ(values("1.5", "00080018"), "1.2.3.1 1.2.3.2");
     EXPECT_EQ(get("/studies/1.2/series/1.2.3/metadata").status, 404);
@@ -219,13 +206,10 @@ TEST_F(ChangeTest, NamesWhoIsKnownAndNotWhomTheJobNames)
     mSettings.access->audit = mStore.filePath("audit.jsonl").toUtf8();
     start();
     storeStudy();
-    EXPECT_EQ(correct("1.2", "?all=true", kRename).status, 403);
     EXPECT_EQ(ask("DELETE", "/dicom-web/studies/1.2", {}, {}, "X-User: berta\r\n").status, 403);
-    EXPECT_EQ(
-        correct("1.2", "?all=true", kRename, "X-User: berta\r\nOrigin: https://evil.example\r\n").status,
-        403);
-    EXPECT_EQ(correct("1.2", "?all=true", kRename, "X-User: berta\r\nSec-Fetch-Site: cross-site\r\n").status,
-              403);
+    for (const char* headers : {"", "X-User: berta\r\nOrigin: https://evil.example\r\n",
+                                "X-User: berta\r\nSec-Fetch-Site: cross-site\r\n"})
+        EXPECT_EQ(correct("1.2", "?all=true", kRename, headers).status, 403) << headers;
     const QByteArray who = "J\xc3\xbcrg \xd0\x96";
     EXPECT_EQ(correct("1.2", "?series=1.2.3", kRename, "X-User: " + who + "\r\n").status, 200);
     const QByteArray history = get("/studies/1.2/corrections").body;
@@ -249,15 +233,11 @@ TEST_F(ChangeTest, TellsInTheTrailWhichStudiesAndHowManyImages)
     mServer.reset();
     QStringList lines;
     for (const QByteArray& line : fileContent(mStore.filePath("audit.jsonl")).split('\n')) {
-        const QJsonObject told = QJsonDocument::fromJson(line).object();
-        QStringList studies;
-        for (const QJsonValue study : told[QLatin1String("studies")].toArray())
-            studies << study.toString();
+        QStringList studies = jsonAt(line, "studies").toVariant().toStringList();
         studies.sort();
         if (!studies.isEmpty())
-            lines << told[QLatin1String("method")].toString() + QLatin1Char(' ') +
-                         studies.join(QLatin1Char(',')) + QLatin1Char(' ') +
-                         told[QLatin1String("images")].toVariant().toString();
+            lines << jsonAt(line, "method").toString() + QLatin1Char(' ') + studies.join(QLatin1Char(',')) +
+                         QLatin1Char(' ') + jsonAt(line, "images").toVariant().toString();
     }
     // Requests over several connections have their lines when their answers are gone, in whatever order.
     lines.sort();
@@ -271,10 +251,9 @@ TEST_F(ChangeTest, TellsWhoeverComesWhileOthersWorkOnTheStudy)
     start();
     storeStudy();
     ASSERT_EQ(values("1.2", "00080018"), "1.2.3.1 1.2.3.2 1.2.4.1");
-    Result result;
-    const auto catalogue = Kxg::Catalogue::open(mDatabase, result);
+    const auto database = catalogue();
     std::unique_ptr<Kxg::StudyClaim> claim;
-    ASSERT_TRUE(catalogue->claim("1.2", 0, claim).good() && claim != nullptr);
+    ASSERT_TRUE(database->claim("1.2", 0, claim).good() && claim != nullptr);
     for (const Reply& reply : {correct("1.2", "?all=true", kRename), remove("/studies/1.2")}) {
         EXPECT_EQ(reply.status, 503);
         EXPECT_EQ(reply.header("Retry-After"), "10");

@@ -2,12 +2,14 @@
 
 #include "server/ServerFixture.h"
 #include "support/FileContent.h"
-#include "support/PostgresServer.h"
+#include "support/Json.h"
 
 #include <kddlib/TagFile.h>
 
 namespace Kdd
 {
+
+const QByteArray kRenamed = R"({"tags":[{"tag":"00100010","value":"Roe^Jane"}]})";
 
 /// A server that takes objects and corrections, and deletes, over a store of its own.
 class ChangedArchive : public ServerFixture
@@ -47,24 +49,19 @@ protected:
     void storeStudy() const
     {
         for (const char* uid : {"1.2.3.1", "1.2.3.2"})
-            store(anImage(uid).with(DCM_PatientName, "Doe^John").with(DCM_PatientID, "7"));
+            store(anImage(uid).with("PatientName=Doe^John|PatientID=7"));
         store(anImage("1.2.4.1").inSeries("1.2.4").with(DCM_PatientName, "Doe^John"));
     }
-
-    static QJsonObject objectOf(const Reply& reply) { return QJsonDocument::fromJson(reply.body).object(); }
 
     /// The values of an attribute of all images of a study, by UID, separated by blanks.
     std::string values(const QByteArray& study, const char* key) const
     {
         QMap<QString, QString> texts;
-        const QJsonArray images =
-            QJsonDocument::fromJson(get("/studies/" + study + "/metadata").body).array();
-        const auto valueOf = [](const QJsonValue& image, const char* name) {
-            const QJsonValue value = image[QLatin1String(name)][QLatin1String("Value")][0];
-            return (value.isObject() ? value[QLatin1String("Alphabetic")] : value).toVariant().toString();
-        };
-        for (const QJsonValue image : images)
-            texts.insert(valueOf(image, "00080018"), valueOf(image, key));
+        for (const QJsonValue image : jsonAt(get("/studies/" + study + "/metadata").body).toArray()) {
+            const QJsonValue value = jsonAt(image, key + QByteArray("/Value/0"));
+            texts.insert(jsonAt(image, "00080018/Value/0").toString(),
+                         (value.isObject() ? jsonAt(value, "Alphabetic") : value).toVariant().toString());
+        }
         return QStringList(texts.values()).join(QLatin1Char(' ')).toStdString();
     }
 
@@ -72,10 +69,9 @@ protected:
     std::string feed(const QByteArray& study) const
     {
         QStringList kinds;
-        const QJsonArray changes = objectOf(get("/changefeed"))[QLatin1String("changes")].toArray();
-        for (const QJsonValue change : changes)
-            if (change[QLatin1String("study")].toString().toLatin1() == study)
-                kinds << change[QLatin1String("change")].toString();
+        for (const QJsonValue change : jsonAt(get("/changefeed").body, "changes").toArray())
+            if (jsonAt(change, "study").toString().toLatin1() == study)
+                kinds << jsonAt(change, "change").toString();
         return kinds.join(QLatin1Char(' ')).toStdString();
     }
 };

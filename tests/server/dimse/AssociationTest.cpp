@@ -44,21 +44,16 @@ TEST_F(AssociationTest, GoesToThoseWhomTheRulesKnowByTitleAndAddress)
     mSettings.dimse->rules = file.rules;
     mSettings.dimse->rules.titles = {"KDD", "ARCHIVE"};
     start();
-    const struct
-    {
-        const char* calling;
-        const char* called;
-        const char* answer;
-    } kCallers[] = {{"CT1", "KDD", "accepted"}, {"CT1", "ARCHIVE", "accepted"}, {"WS 1", "KDD", "accepted"},
-                    {"CT1", "KD", "010107"},    {"CT2", "KDD", "010103"},       {"OTHER", "KDD", "010103"},
-                    {"ct1", "KDD", "010103"}};
-    for (const auto& caller : kCallers) {
+    const std::tuple<const char*, const char*, const char*> kCallers[] = {
+        {"CT1", "KDD", "accepted"}, {"CT1", "ARCHIVE", "accepted"}, {"WS 1", "KDD", "accepted"},
+        {"CT1", "KD", "010107"},    {"CT2", "KDD", "010103"},       {"OTHER", "KDD", "010103"},
+        {"ct1", "KDD", "010103"}};
+    for (const auto& [calling, called, answer] : kCallers) {
         RawCaller raw(mServer->dimseAddress());
-        EXPECT_EQ(answerTo(raw, caller.called, caller.calling), caller.answer) << caller.calling;
+        EXPECT_EQ(answerTo(raw, called, calling), answer) << calling;
     }
     for (const char* calling : {"CT1", "WS 1"}) {
-        RawCaller raw(mServer->dimseAddress());
-        raw.associate({{kCapture, {kExplicit}}, {kEcho, {kImplicit}}}, "KDD", calling);
+        RawCaller raw(mServer->dimseAddress(), {{kCapture, {kExplicit}}, {kEcho, {kImplicit}}}, calling);
         EXPECT_EQ(raw.accepted(),
                   (QVector<QByteArray>{calling[0] == 'C' ? kExplicit : QByteArray("1"), kImplicit}));
     }
@@ -124,11 +119,8 @@ TEST_F(AssociationTest, SurvivesWhatNobodyShouldSend)
     QByteArray nested;
     for (int i = 0; i < 1000; ++i)
         nested += QByteArray("\x08\0\x40\x11\xff\xff\xff\xff\xfe\xff\x00\xe0\xff\xff\xff\xff", 16);
-    const struct
-    {
-        const char* name;
-        QByteArray bytes;  // behind a request
-    } kHostile[] = {
+    // bytes: behind a request
+    const std::pair<const char*, QByteArray> kHostile[] = {
         {"unknown kind of PDU", RawCaller::pdu(9, "abcd")},
         {"second request", request},
         {"PDU larger than agreed", RawCaller::pdu(4, QByteArray(200000, 'x'))},
@@ -151,13 +143,13 @@ TEST_F(AssociationTest, SurvivesWhatNobodyShouldSend)
         {"half a message and release", data(command) + RawCaller::pdu(5, QByteArray(4, 0))},
     };
     start();
-    for (const auto& hostile : kHostile) {
+    for (const auto& [name, bytes] : kHostile) {
         RawCaller caller(mServer->dimseAddress());
         EXPECT_EQ(caller.associate({{kCapture, {kExplicit}}}).left(1), QByteArray(1, 2));
-        caller.send(hostile.bytes);
+        caller.send(bytes);
         const QByteArray answer = caller.receive();
-        EXPECT_TRUE(answer.isEmpty() || answer.at(0) == 7) << hostile.name << answer.toHex().constData();
-        EXPECT_EQ(store(anImage()), 0) << hostile.name;
+        EXPECT_TRUE(answer.isEmpty() || answer.at(0) == 7) << name << answer.toHex().constData();
+        EXPECT_EQ(store(anImage()), 0) << name;
     }
 }
 

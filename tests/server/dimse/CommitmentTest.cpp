@@ -2,7 +2,6 @@
 #include "server/dimse/OnlyPatient.h"
 
 #include <gmock/gmock.h>
-#include <kddlib/Catalogue.h>
 
 using namespace Kdd;
 using testing::HasSubstr;
@@ -22,14 +21,13 @@ protected:
     }
 
     /// What a modality is told that asks for objects, "1.2.3.1" or "CLASS=1.2.3.1"; at a port, when it has left.
-    std::string ask(const QStringList& objects, quint16 at = 0, const char* title = "CT1") const
+    std::string ask(const QByteArray& objects, quint16 at = 0, const QByteArray& title = "CT1") const
     {
-        QStringList arguments = {port(), QLatin1String(title), QStringLiteral("1.9.9"), QString::number(at)};
-        for (const QString& object : objects)
-            arguments << (object.contains(QLatin1Char('=')) ? object
-                                                            : QString::fromLatin1(kCapture + '=') + object);
+        QByteArray arguments = port().toLatin1() + ' ' + title + " 1.9.9 " + QByteArray::number(at);
+        for (const QByteArray& object : objects.split(' '))
+            arguments += ' ' + (object.contains('=') ? object : kCapture + '=' + object);
         QProcess process;
-        process.start(QStringLiteral(COMMITMENT_SCU), arguments);
+        process.start(QStringLiteral(COMMITMENT_SCU), words(arguments));
         return finish(process).text.toStdString();
     }
 
@@ -37,8 +35,7 @@ protected:
     int askRaw(const QByteArray& dataset, const char* title) const
     {
         const QByteArray sopClass = UID_StorageCommitmentPushModelSOPClass;
-        RawCaller caller(mServer->dimseAddress());
-        caller.associate({{sopClass, {kImplicit}}}, "KDD", title);
+        RawCaller caller(mServer->dimseAddress(), {{sopClass, {kImplicit}}}, title);
         caller.send(RawCaller::pdu(4, RawCaller::value(1, 3, RawCaller::actionCommand())));
         constexpr int kPiece = 10000;
         for (int at = 0; at == 0 || at < dataset.size(); at += kPiece)
@@ -55,21 +52,18 @@ protected:
 TEST_F(CommitmentTest, TellsOfEachObjectWhetherItIsSafe)
 {
     fill();
-    Result result;
-    const auto catalogue = Kxg::Catalogue::open(Kxg::DatabaseServer(), result);
+    const auto database = catalogue();
     QMap<QByteArray, qint64> requests;
-    ASSERT_TRUE(catalogue->removeImage("1.2", "1.2.3.2").good());
-    ASSERT_TRUE(catalogue
+    ASSERT_TRUE(database->removeImage("1.2", "1.2.3.2").good());
+    ASSERT_TRUE(database
                     ->recordCorrections({{"1.2", "1.2.3.3", "1.7", "1.7.1", "1.2.3.3", "moved"},
                                          {"1.2", "1.2.3.4", "1.2", "1.2.3", "1.8.8", "renamed"}},
                                         requests)
                     .good());
     EXPECT_TRUE(QFile::resize(fileOf("1.2.3.5.dcm"), 500));
     EXPECT_TRUE(QFile::remove(fileOf("1.2.3.6.dcm")));
-    const std::string said =
-        ask({QStringLiteral("1.2.3.1"), QStringLiteral("1.2.3.2"), QStringLiteral("1.2.3.3"),
-             QStringLiteral("1.2.3.4"), QStringLiteral("1.2.3.5"), QStringLiteral("1.2.3.6"),
-             QStringLiteral("1.2.840.10008.5.1.4.1.1.2=1.2.3.7"), QStringLiteral("1.8.8")});
+    const std::string said = ask("1.2.3.1 1.2.3.2 1.2.3.3 1.2.3.4 1.2.3.5 1.2.3.6 "
+                                 "1.2.840.10008.5.1.4.1.1.2=1.2.3.7 1.8.8");
     EXPECT_EQ(said, "status 0000\nevent 2 of 1.9.9\n"
                     "1.2.3.1 kept at KDD\n"
                     "1.2.3.3 kept at KDD\n"
@@ -79,7 +73,7 @@ TEST_F(CommitmentTest, TellsOfEachObjectWhetherItIsSafe)
                     "1.2.3.6 failed 0112\n"
                     "1.2.3.7 failed 0119\n"
                     "1.8.8 failed 0112\n");
-    EXPECT_EQ(ask({QStringLiteral("1.2.3.1")}), "status 0000\nevent 1 of 1.9.9\n1.2.3.1 kept at KDD\n");
+    EXPECT_EQ(ask("1.2.3.1"), "status 0000\nevent 1 of 1.9.9\n1.2.3.1 kept at KDD\n");
 }
 
 TEST_F(CommitmentTest, IsBroughtToWhoHasLeft)
@@ -88,7 +82,7 @@ TEST_F(CommitmentTest, IsBroughtToWhoHasLeft)
     mSettings.dimse->rules.peers.insert("CT1", {{}, "127.0.0.1", port, false, Dimse::Right::Store});
     mSettings.dimse->linger = std::chrono::hours(1);
     fill();
-    EXPECT_EQ(ask({QStringLiteral("1.2.3.1"), QStringLiteral("1.9")}, port),
+    EXPECT_EQ(ask("1.2.3.1 1.9", port),
               "status 0000\nevent 2 of 1.9.9\n1.2.3.1 kept at KDD\n1.9 failed 0112\n");
 }
 
@@ -112,8 +106,8 @@ TEST_F(CommitmentTest, IsTriedUntilTheServerEndsAndThenToldAsLost)
 TEST_F(CommitmentTest, RefusesWhatItCannotUnderstand)
 {
     fill();
-    EXPECT_EQ(ask({QStringLiteral("1.2.3.1\\1.2.3.2")}), "status 0115\n");
-    EXPECT_EQ(ask({QStringLiteral("=1.2.3.1")}), "status 0115\n");
+    EXPECT_EQ(ask("1.2.3.1\\1.2.3.2"), "status 0115\n");
+    EXPECT_EQ(ask("=1.2.3.1"), "status 0115\n");
     // Sequences inside each other, each of undefined length.
     const QByteArray level("\x08\x00\x99\x11\xff\xff\xff\xff\xfe\xff\x00\xe0\xff\xff\xff\xff", 16);
     const std::pair<QByteArray, int> hostile[] = {
@@ -133,7 +127,7 @@ TEST_F(CommitmentTest, RefusesWhatItCannotUnderstand)
     const QByteArray after("\xfe\xff\xdd\xe0\0\0\0\0", 8);
     EXPECT_EQ(askRaw(before + object.repeated(20000) + after, "CT1"), 0);
     EXPECT_EQ(askRaw(before + object.repeated(20001) + after, "CT1"), 0x0213);
-    EXPECT_THAT(ask({QStringLiteral("1.2.3.1")}), HasSubstr("1.2.3.1 kept"));
+    EXPECT_THAT(ask("1.2.3.1"), HasSubstr("1.2.3.1 kept"));
 }
 
 TEST_F(CommitmentTest, IsForThoseWhoMayStoreAndOfWhatTheyMaySee)
@@ -142,7 +136,7 @@ TEST_F(CommitmentTest, IsForThoseWhoMayStoreAndOfWhatTheyMaySee)
     mSettings.dimse->rules.peers.insert("P1", {{}, {}, 0, false, Dimse::kAllRights, onlyPatient("P1")});
     mSettings.dimse->rules.peers.insert("P2", {{}, {}, 0, false, Dimse::kAllRights, onlyPatient("P2")});
     fill();
-    const QStringList all = {QStringLiteral("1.2.3.1"), QStringLiteral("1.2.840.10008.5.1.4.1.1.2=1.2.3.2")};
+    const QByteArray all = "1.2.3.1 1.2.840.10008.5.1.4.1.1.2=1.2.3.2";
     EXPECT_THAT(ask(all, 0, "READER"), Not(HasSubstr("status 0000")));
     EXPECT_THAT(ask(all, 0, "P1"), HasSubstr("1.2.3.1 kept at KDD\n1.2.3.2 failed 0119\n"));
     EXPECT_THAT(ask(all, 0, "P2"), HasSubstr("1.2.3.1 failed 0112\n1.2.3.2 failed 0112\n"));

@@ -33,14 +33,13 @@ protected:
     };
 
     /// A tool of DCMTK's, which is told where the server is; `files` come last.
-    std::unique_ptr<QProcess> begin(const char* program, const QStringList& options = {},
-                                    const QStringList& files = {}, const char* called = "KDD") const
+    std::unique_ptr<QProcess> begin(const char* program, const QByteArray& options = {},
+                                    const QStringList& files = {}) const
     {
         auto process = std::make_unique<QProcess>();
         process->setProcessChannelMode(QProcess::MergedChannels);
         process->start(QLatin1String(program),
-                       QStringList{QStringLiteral("-v"), QStringLiteral("-aec"), QLatin1String(called)} +
-                           options + QStringList{QStringLiteral("127.0.0.1"), port()} + files);
+                       words("-v -aec KDD " + options + " 127.0.0.1 " + port().toLatin1()) + files);
         return process;
     }
 
@@ -50,10 +49,9 @@ protected:
         return {process.exitStatus() == QProcess::NormalExit ? process.exitCode() : -1, process.readAll()};
     }
 
-    Said run(const char* program, const QStringList& options = {}, const QStringList& files = {},
-             const char* called = "KDD") const
+    Said run(const char* program, const QByteArray& options = {}, const QStringList& files = {}) const
     {
-        return finish(*begin(program, options, files, called));
+        return finish(*begin(program, options, files));
     }
 
     QString save(const DatasetBuilder& image, const char* name,
@@ -80,8 +78,7 @@ protected:
     int store(const DatasetBuilder& image, const QByteArray& instance = "1.2.3.1",
               const QByteArray& sopClass = kCapture) const
     {
-        RawCaller caller(mServer->dimseAddress());
-        caller.associate({{sopClass, {kExplicit}}});
+        RawCaller caller(mServer->dimseAddress(), {{sopClass, {kExplicit}}});
         return caller.store(sopClass, instance, bytesOf(image));
     }
 };

@@ -48,24 +48,20 @@ TEST_F(DimseStore, ShowsWhatItToldWasStoredInTheNextAnswer)
 TEST_F(DimseStore, KeepsTheBytesOfADatasetHoweverTheyComeInPieces)
 {
     const DatasetBuilder image = anImage().with(DCM_PatientName, "Doe^J").words(std::vector<Uint16>(5000, 7));
-    const struct
-    {
-        QByteArray uid;
-        E_TransferSyntax syntax;
-    } kForms[] = {{kExplicit, EXS_LittleEndianExplicit},
-                  {kImplicit, EXS_LittleEndianImplicit},
-                  {UID_BigEndianExplicitTransferSyntax, EXS_BigEndianExplicit}};
-    for (const auto& form : kForms) {
+    const std::pair<QByteArray, E_TransferSyntax> kForms[] = {
+        {kExplicit, EXS_LittleEndianExplicit},
+        {kImplicit, EXS_LittleEndianImplicit},
+        {UID_BigEndianExplicitTransferSyntax, EXS_BigEndianExplicit}};
+    for (const auto& [uid, syntax] : kForms) {
         for (const int piece : {2, 1000, 100000}) {
             QDir(mStore.filePath("objects")).removeRecursively();
-            Kxg::SetDatabaseServer(mDatabase + form.uid + QByteArray::number(piece));
+            Kxg::SetDatabaseServer(mDatabase + uid + QByteArray::number(piece));
             start();
-            RawCaller caller(mServer->dimseAddress());
-            caller.associate({{kCapture, {form.uid}}});
-            const QByteArray sent = bytesOf(image, form.syntax);
+            RawCaller caller(mServer->dimseAddress(), {{kCapture, {uid}}});
+            const QByteArray sent = bytesOf(image, syntax);
             EXPECT_EQ(caller.store(kCapture, "1.2.3.1", sent, 1, piece), 0);
             caller.release();
-            EXPECT_EQ(datasetStored(), sent) << form.uid.constData() << ' ' << piece;
+            EXPECT_EQ(datasetStored(), sent) << uid.constData() << ' ' << piece;
         }
     }
 }
@@ -82,8 +78,7 @@ TEST_F(DimseStore, TellsByTheStatusWhatBecameOfAnObject)
     EXPECT_EQ(store(anImage("1.2.3.2").inStudy(""), "1.2.3.2"), 0xC000);
     EXPECT_EQ(store(anImage("../../x"), "../../x"), 0xC000);
     EXPECT_EQ(store(anImage("1.2.3.2").words(std::vector<Uint16>(30000, 7)), "1.2.3.2"), 0xA700);
-    RawCaller caller(mServer->dimseAddress());
-    caller.associate({{kCapture, {kExplicit}}});
+    RawCaller caller(mServer->dimseAddress(), {{kCapture, {kExplicit}}});
     EXPECT_EQ(caller.store(kCapture, "1.2.3.2", QByteArray(3000, 'x')), 0xC000);
     EXPECT_EQ(caller.store(UID_CTImageStorage, "1.2.3.2", bytesOf(anImage("1.2.3.2"))), 0x0122);
     EXPECT_EQ(caller.store(kCapture, "1.2.3.2", bytesOf(anImage("1.2.3.2"))), 0) << "the association goes on";
@@ -97,8 +92,7 @@ TEST_F(DimseStore, TakesOfALimitedPeerWhatItMaySee)
     start();
     ASSERT_EQ(store(anImage().inStudy("1.9").with(DCM_PatientID, "P2")), 0);
     ASSERT_EQ(instances("1.9"), 1) << "it is complete, and so known as that patient's";
-    RawCaller caller(mServer->dimseAddress());
-    caller.associate({{kCapture, {kExplicit}}}, "KDD", "LIMITED");
+    RawCaller caller(mServer->dimseAddress(), {{kCapture, {kExplicit}}}, "LIMITED");
     const auto send = [&](const char* uid, const char* study, const char* patient) {
         const DatasetBuilder image = anImage(uid).inStudy(study).with(DCM_PatientID, patient);
         return caller.store(kCapture, uid, bytesOf(image));
@@ -128,8 +122,8 @@ TEST_F(DimseStore, TakesObjectsOfClassesThatNoTableKnows)
     for (const bool isTaken : {true, false}) {
         mSettings.dimse->rules.takesUnknownClasses = isTaken;
         start();
-        RawCaller caller(mServer->dimseAddress());
-        caller.associate({{kPrivate, {kExplicit}}, {kNewer, {kExplicit}}, {kPrinting, {kExplicit}}});
+        RawCaller caller(mServer->dimseAddress(),
+                         {{kPrivate, {kExplicit}}, {kNewer, {kExplicit}}, {kPrinting, {kExplicit}}});
         EXPECT_EQ(caller.accepted(),
                   (QVector<QByteArray>{isTaken ? kExplicit : QByteArray("3"), kExplicit, "3"}));
         const DatasetBuilder image = anImage(isTaken ? "1.2.3.1" : "1.2.3.2").with(DCM_SOPClassUID, kNewer);
@@ -165,7 +159,7 @@ TEST_F(DimseStore, StoresWhatManySendAtOnceAndNothingTwice)
     }
     // Each sends half of them, which another one sends too.
     for (int i = 0; i < 8; ++i)
-        senders.push_back(begin(i % 2 == 0 ? "storescu" : "dcmsend", {}, files.mid(i * 5 % 40, 20)));
+        senders.push_back(begin(i % 2 == 0 ? "storescu" : "dcmsend", "", files.mid(i * 5 % 40, 20)));
     for (const auto& sender : senders) {
         const Said said = finish(*sender);
         EXPECT_EQ(said.exitCode, 0) << said.text.constData();
@@ -179,8 +173,7 @@ TEST_F(DimseStore, KeepsNothingOfAnObjectThatDoesNotComeWhole)
     start();
     const QByteArray sent = bytesOf(anImage().words(std::vector<Uint16>(5000, 7)));
     {
-        RawCaller caller(mServer->dimseAddress());
-        caller.associate({{kCapture, {kExplicit}}});
+        RawCaller caller(mServer->dimseAddress(), {{kCapture, {kExplicit}}});
         caller.send(RawCaller::pdu(4, RawCaller::value(1, 3, RawCaller::storeCommand(kCapture, "1.2.3.1"))));
         caller.send(RawCaller::pdu(4, RawCaller::value(1, 0, sent.left(5000))));
         while (!isReceiving())

@@ -1,4 +1,5 @@
 #include "server/dimse/DimseFixture.h"
+#include "support/FileContent.h"
 
 using namespace Kdd;
 
@@ -8,11 +9,9 @@ namespace
 class DimseTls : public DimseFixture
 {
 protected:
-    static QString text(const QByteArray& path) { return QString::fromLocal8Bit(path); }
-
-    static QStringList showing(const TlsFiles& files)
+    static QByteArray showing(const TlsFiles& files)
     {
-        return {QStringLiteral("+tls"), text(files.key()), text(files.certificate())};
+        return "+tls " + files.key() + ' ' + files.certificate();
     }
 
     TlsFiles mServerFiles;
@@ -21,31 +20,24 @@ protected:
 
 TEST_F(DimseTls, TakesThoseWhoseCertificatesAreGood)
 {
-    const QStringList trusting = {QStringLiteral("+cf"), text(mServerFiles.certificate())};
-    const QStringList unnamed = QStringList{QStringLiteral("+tla")} + trusting;
+    const QByteArray trusting = " +cf " + mServerFiles.certificate();
+    const QByteArray unnamed = "+tla" + trusting;
     const TlsFiles others;
-    const struct
-    {
-        bool isRequired;
-        QStringList options;
-        bool isTaken;
-    } kCallers[] = {{true, showing(mPeerFiles) + trusting, true},
-                    {true, showing(others) + trusting, false},
-                    {true, unnamed, false},
-                    {true, {}, false},
-                    {false, unnamed, true},
-                    {false, showing(others) + trusting, false},
-                    {false, {}, false}};
+    const std::tuple<bool, QByteArray, bool> kCallers[] = {{true, showing(mPeerFiles) + trusting, true},
+                                                           {true, showing(others) + trusting, false},
+                                                           {true, unnamed, false},
+                                                           {true, {}, false},
+                                                           {false, unnamed, true},
+                                                           {false, showing(others) + trusting, false},
+                                                           {false, {}, false}};
     const QString file = save(anImage(), "sent.dcm");
-    for (const auto& caller : kCallers) {
+    for (const auto& [isRequired, options, isTaken] : kCallers) {
         mSettings.dimse->tls = {mServerFiles.certificate(), mServerFiles.key(), mPeerFiles.certificate(),
-                                caller.isRequired};
+                                isRequired};
         mSettings.dimse->patience = std::chrono::seconds(2);
         start();
-        const Said said = run("storescu", caller.options, {file});
-        EXPECT_EQ(said.exitCode == 0, caller.isTaken)
-            << caller.isRequired << caller.options.join(QLatin1Char(' ')).toStdString()
-            << said.text.constData();
+        const Said said = run("storescu", options, {file});
+        EXPECT_EQ(said.exitCode == 0, isTaken) << isRequired << options.constData() << said.text.constData();
     }
     EXPECT_EQ(instances(), 1);
 }
@@ -54,24 +46,21 @@ TEST_F(DimseTls, ShowsTheCertificateThatWasReadLast)
 {
     const TlsFiles used;
     const auto take = [&](const TlsFiles& files) {
-        QFile::remove(text(used.certificate()));
-        QFile::remove(text(used.key()));
-        return QFile::copy(text(files.certificate()), text(used.certificate())) &&
-               QFile::copy(text(files.key()), text(used.key()));
+        putFile(QFile::decodeName(used.certificate()), fileContent(QFile::decodeName(files.certificate())));
+        putFile(QFile::decodeName(used.key()), fileContent(QFile::decodeName(files.key())));
     };
     const auto isShown = [&](const TlsFiles& files) {
-        return run("echoscu", {QStringLiteral("+tla"), QStringLiteral("+cf"), text(files.certificate())})
-                   .exitCode == 0;
+        return run("echoscu", "+tla +cf " + files.certificate()).exitCode == 0;
     };
-    ASSERT_TRUE(take(mServerFiles));
+    take(mServerFiles);
     mSettings.dimse->tls = {used.certificate(), used.key(), {}, false};
     start();
     EXPECT_TRUE(isShown(mServerFiles));
-    ASSERT_TRUE(take(mPeerFiles));
+    take(mPeerFiles);
     EXPECT_TRUE(mServer->renewCertificate().good());
     EXPECT_FALSE(isShown(mServerFiles));
     EXPECT_TRUE(isShown(mPeerFiles));
-    QFile::remove(text(used.key()));
+    QFile::remove(QFile::decodeName(used.key()));
     EXPECT_TRUE(mServer->renewCertificate().bad());
     EXPECT_TRUE(isShown(mPeerFiles)) << "the former one stays";
 }

@@ -13,11 +13,7 @@ namespace
 
 TEST(PeersFileTest, IsRefusedForEverySlipWithItsPlace)
 {
-    const struct
-    {
-        const char* text;
-        const char* reason;
-    } kSlips[] = {
+    const std::pair<const char*, const char*> kSlips[] = {
         {"", "no JSON object"},
         {"[]", "no JSON object"},
         {"{}", "lets nobody in"},
@@ -50,11 +46,10 @@ TEST(PeersFileTest, IsRefusedForEverySlipWithItsPlace)
          "no rights for anyone"},
         {R"({"anyone": ["store"], "unknownClasses": 1})", "unknownClasses is neither true nor false"},
     };
-    for (const auto& slip : kSlips) {
+    for (const auto& [text, reason] : kSlips) {
         PeersFile file;
-        const Result result = PeersFile::parse(slip.text, file);
-        EXPECT_TRUE(result.text().contains(QLatin1String(slip.reason)))
-            << slip.text << result.text().toStdString();
+        const Result result = PeersFile::parse(text, file);
+        EXPECT_TRUE(result.text().contains(QLatin1String(reason))) << text << result.text().toStdString();
         EXPECT_FALSE(file.rules.anyone || !file.rules.peers.isEmpty()) << "nothing of it is in force";
     }
 }

@@ -26,6 +26,13 @@ public:
     };
 
     explicit RawCaller(const QByteArray& address);
+
+    /// Whose association is asked for at once.
+    RawCaller(const QByteArray& address, const QVector<Offer>& offers, const QByteArray& calling = "TEST")
+        : RawCaller(address)
+    {
+        associate(offers, "KDD", calling);
+    }
     ~RawCaller();
     RawCaller(const RawCaller&) = delete;
     RawCaller& operator=(const RawCaller&) = delete;

@@ -1,20 +1,16 @@
 #include "server/faults/Served.h"
-#include "support/PostgresServer.h"
+#include "support/Engines.h"
 
 using namespace Kdd;
 
 namespace
 {
 
-enum class Engine { Sqlite, Postgres };
-
 class DatabaseFaults : public Served, public testing::WithParamInterface<Engine>
 {
 protected:
     DatabaseFaults()
-        : mDatabase("KDD_DATABASE", GetParam() == Engine::Sqlite
-                                        ? "sqlite:" + path("store/kdd.sqlite").toStdString()
-                                        : newPostgresDatabase().toStdString())
+        : mDatabase("KDD_DATABASE", newDatabase(GetParam(), path("store/kdd.sqlite")).toStdString())
     {
     }
 
@@ -48,16 +44,12 @@ protected:
     Setting mDatabase;
 };
 
-INSTANTIATE_TEST_SUITE_P(Engines, DatabaseFaults, testing::Values(Engine::Sqlite, Engine::Postgres),
-                         [](const auto& engine) {
-                             return engine.param == Engine::Sqlite ? std::string("Sqlite")
-                                                                   : std::string("Postgres");
-                         });
+INSTANTIATE_TEST_SUITE_P(Engines, DatabaseFaults, kBothEngines, engineName);
 
 TEST_P(DatabaseFaults, AreToldAndPassByThemselves)
 {
     addTwoStudies();
-    serve({QStringLiteral("--threads"), QStringLiteral("4")});
+    serve("--threads 4");
     expectOfAll(200);
     const qint64 descriptors = openDescriptors();
     for (int round = 0; round < 3; ++round) {
@@ -75,24 +67,14 @@ TEST_P(DatabaseFaults, AreToldAndPassByThemselves)
     EXPECT_EQ(end(), 0);
 }
 
-class DatabaseServer : public DatabaseFaults
-{
-};
+using DatabaseServer = DatabaseFaults;
 
-INSTANTIATE_TEST_SUITE_P(Engines, DatabaseServer, testing::Values(Engine::Postgres),
-                         [](const auto&) { return std::string("Postgres"); });
+INSTANTIATE_TEST_SUITE_P(Engines, DatabaseServer, testing::Values(Engine::Postgres), engineName);
 
 TEST_P(DatabaseServer, ThatIsAwayKeepsChangesFromBeingMade)
 {
     addTwoStudies();
-    serve({QStringLiteral("--stow"), QStringLiteral("--corrections"), QStringLiteral("--deletions")});
-    const auto ask = [this](const QByteArray& method, const QByteArray& target, const QByteArray& type,
-                            const QByteArray& body) {
-        Client client(mAddress);
-        client.send(method + " /dicom-web/" + target + " HTTP/1.1\r\nHost: localhost\r\nContent-Type: " +
-                    type + "\r\nContent-Length: " + QByteArray::number(body.size()) + "\r\n\r\n" + body);
-        return client.reply();
-    };
+    serve("--stow --corrections --deletions");
     const QByteArray object = fileContent(file("3"));
     const auto statuses = [&] {
         const Reply replies[] = {ask("POST", "studies", "application/dicom", object),
@@ -120,7 +102,7 @@ TEST_P(DatabaseServer, IsNotWaitedForWithoutEnd)
 {
     const Setting patience("KDD_DATABASE_PATIENCE", "2");
     addTwoStudies();
-    serve({QStringLiteral("--threads"), QStringLiteral("4")});
+    serve("--threads 4");
     expectOfAll(200);
     {
         const FrozenPostgres frozen;
@@ -134,14 +116,12 @@ TEST_P(DatabaseServer, IsNotWaitedForWithoutEnd)
     EXPECT_EQ(end(), 0);
 }
 
-class DatabaseFile : public Served
-{
-};
+using DatabaseFile = Served;
 
 TEST_F(DatabaseFile, ThatIsPutInPlaceOfAnotherIsFollowed)
 {
     addTwoStudies();
-    serve({QStringLiteral("--threads"), QStringLiteral("1")});
+    serve("--threads 1");
     EXPECT_TRUE(get("studies").body.contains("\"1.2\""));
     // As an older copy is put back.
     for (const char* name : {"store/kdd.sqlite", "store/kdd.sqlite-wal", "store/kdd.sqlite-shm"})

@@ -24,16 +24,12 @@ protected:
         probe.start(QStringLiteral("unshare"), {QStringLiteral("-rm"), QStringLiteral("true")});
         if (!probe.waitForFinished(kTimeout) || probe.exitCode() != 0)
             GTEST_SKIP() << "the system gives no file systems of one's own";
-        QFile script(path("mounted"));
-        ASSERT_TRUE(script.open(QIODevice::WriteOnly));
-        script.write("#!/bin/sh\nmount -t tmpfs -o size=16m none " + path("store").toUtf8() +
-                     " && exec \"$@\"\n");
-        script.setPermissions(QFile::ReadOwner | QFile::WriteOwner | QFile::ExeOwner);
-        script.close();
+        putFile(path("mounted"),
+                "#!/bin/sh\nmount -t tmpfs -o size=16m none " + path("store").toUtf8() + " && exec \"$@\"\n");
+        QFile::setPermissions(path("mounted"), QFile::ReadOwner | QFile::WriteOwner | QFile::ExeOwner);
         QDir().mkpath(path("store"));
-        serve({QStringLiteral("--stow"), QStringLiteral("--corrections"), QStringLiteral("--deletions"),
-               QStringLiteral("--dicom"), QStringLiteral("127.0.0.1:0")},
-              "", ("unshare -rm " + path("mounted").toUtf8()).constData());
+        serve("--stow --corrections --deletions --dicom 127.0.0.1:0", "",
+              "unshare -rm " + path("mounted").toUtf8());
     }
 
     /// Below the server's own disk.
@@ -61,40 +57,32 @@ protected:
         return fileContent(file(uid.constData()));
     }
 
-    int send(const QByteArray& request, const QByteArray& type, const QByteArray& content) const
-    {
-        Client client(mAddress);
-        client.send(request + " HTTP/1.1\r\nHost: localhost\r\nContent-Type: " + type +
-                    "\r\nContent-Length: " + QByteArray::number(content.size()) + "\r\n\r\n" + content);
-        return client.reply().status;
-    }
-
     int stow(const QByteArray& content) const
     {
-        return send("POST /dicom-web/studies", "application/dicom", content);
+        return ask("POST", "studies", "application/dicom", content).status;
     }
 
     int correct(const QByteArray& value) const
     {
-        return send("POST /dicom-web/studies/1.2/corrections?all=true", "application/json",
-                    "{\"tags\": [{\"tag\": \"00102000\", \"value\": \"" + value + "\"}]}");
+        return ask("POST", "studies/1.2/corrections?all=true", "application/json",
+                   "{\"tags\": [{\"tag\": \"00102000\", \"value\": \"" + value + "\"}]}")
+            .status;
     }
 
     int remove(const QByteArray& uid) const
     {
-        return send("DELETE /dicom-web/studies/1.2/series/1.2.3/instances/" + uid, "text/plain", {});
+        return ask("DELETE", "studies/1.2/series/1.2.3/instances/" + uid, "text/plain", {}).status;
     }
 
     int associate(const QByteArray& uid, const QByteArray& content) const
     {
-        RawCaller caller(mDicom);
-        caller.associate({{kCapture, {UID_LittleEndianExplicitTransferSyntax}}});
+        RawCaller caller(mDicom, {{kCapture, {UID_LittleEndianExplicitTransferSyntax}}});
         return caller.store(kCapture, uid, datasetOf(content));
     }
 
     bool isShown(const QByteArray& word) const { return get("studies/1.2/metadata").body.contains(word); }
 
-    int found() const { return QJsonDocument::fromJson(get("studies/1.2/instances").body).array().size(); }
+    int found() const { return jsonAt(get("studies/1.2/instances").body).toArray().size(); }
 
     const Setting mWatermark{"KDD_FREE_SPACE", "0"};
 

@@ -63,8 +63,7 @@ TEST_F(ProcessFaults, AStoreThatCanBeReadOnlyIsServedAndFollowed)
     const bool isRoot = ::geteuid() == 0;
     if (!isRoot)
         GTEST_SKIP() << "only an administrator can be another user";
-    serve({QStringLiteral("--threads"), QStringLiteral("1")}, "",
-          "setpriv --reuid nobody --regid nogroup --clear-groups");
+    serve("--threads 1", "", "setpriv --reuid nobody --regid nogroup --clear-groups");
     const auto expectServed = [this](const char* studies) {
         EXPECT_EQ(get("studies").body.count("\"00201208\""), QByteArray(studies).toInt());
         EXPECT_EQ(get("studies/1.3/metadata", kGzip).status, 200);
@@ -105,11 +104,10 @@ TEST_F(ProcessFaults, WithoutDescriptorsItSaysSoAndGoesOnWhenThereAreSomeAgain)
     GTEST_SKIP() << "the sanitizers' runtime takes descriptors of its own";
 #endif
     addLargeImage();
-    serve({QStringLiteral("--threads"), QStringLiteral("4")});
+    serve("--threads 4");
     Client connected(mAddress);
     const auto statusOf = [&](const QByteArray& target) {
-        connected.get("/dicom-web/" + target, "Accept: */*\r\n");
-        const Reply reply = connected.reply();
+        const Reply reply = connected.ask("/dicom-web/" + target, "Accept: */*\r\n");
         EXPECT_TRUE(reply.isWhole);
         return reply.status;
     };
@@ -133,7 +131,7 @@ TEST_F(ProcessFaults, WithoutDescriptorsItSaysSoAndGoesOnWhenThereAreSomeAgain)
 TEST_F(ProcessFaults, ClientsThatVanishLeaveNothing)
 {
     addLargeImage();
-    serve({QStringLiteral("--threads"), QStringLiteral("4")});
+    serve("--threads 4");
     onThreads(8, [this](int) { EXPECT_TRUE(get(kLarge, kBytes).isWhole && get("studies").status == 200); });
     ASSERT_TRUE(hasNoConnections());
     const qint64 descriptors = openDescriptors();
@@ -152,7 +150,7 @@ TEST_F(ProcessFaults, AThousandClientsThatDoNotReadTakeLittleMemory)
     GTEST_SKIP() << "the sanitizers' runtime takes memory of its own";
 #endif
     addLargeImage();
-    serve({QStringLiteral("--threads"), QStringLiteral("4")});
+    serve("--threads 4");
     std::vector<std::unique_ptr<Client>> clients;
     for (int i = 0; i < 1000; ++i) {
         clients.push_back(std::make_unique<Client>(mAddress, Client::Tls::No, 4096));
@@ -211,7 +209,7 @@ TEST_F(ProcessFaults, ACertificateIsRenewedWithoutAnEnd)
     };
     const auto contentOf = [](const QByteArray& name) { return fileContent(QFile::decodeName(name)); };
     take(contentOf(used.certificate()), contentOf(used.key()));
-    serve({QStringLiteral("--tls-cert"), path("tls.pem"), QStringLiteral("--tls-key"), path("key.pem")});
+    serve("--tls-cert " + path("tls.pem").toUtf8() + " --tls-key " + path("key.pem").toUtf8());
     const auto shown = [this] { return Client(mAddress, Client::Tls::Yes).certificate(); };
     Client client(mAddress, Client::Tls::Yes);
     const QByteArray first = client.certificate();
@@ -220,8 +218,7 @@ TEST_F(ProcessFaults, ACertificateIsRenewedWithoutAnEnd)
     signal(SIGHUP);
     EXPECT_TRUE(comesTrue([&] { return shown() != first; }));
     const QByteArray second = shown();
-    client.get("/dicom-web/studies");
-    EXPECT_EQ(client.reply().status, 200) << "the connection stays";
+    EXPECT_EQ(client.ask("/dicom-web/studies").status, 200) << "the connection stays";
     take(contentOf(renewed.certificate()), contentOf(used.key()));
     signal(SIGHUP);
     EXPECT_TRUE(comesTrue([this] { return fileContent(path("log")).contains("former certificate"); }));

@@ -19,26 +19,21 @@ protected:
     ~Served() override { end(SIGKILL); }
 
     /// `shell` runs before it in its process, for example "ulimit -n 100;"; `runner` runs it.
-    void serve(const QStringList& options = {}, const char* shell = "", const char* runner = "")
+    void serve(const QByteArray& options = {}, const QByteArray& shell = {}, const QByteArray& runner = {})
     {
         mServer = std::make_unique<QProcess>();
         // A pipe that nobody empties would hold it up.
         mServer->setStandardErrorFile(path("log"));
         // Without a terminal, as services are.
-        const QString command = QLatin1String(shell) + QStringLiteral(" exec setsid ") +
-                                QLatin1String(runner) + QStringLiteral(" \"$0\" \"$@\"");
-        const QStringList words{QStringLiteral("--store"),  path("store"),
-                                QStringLiteral("--json"),   QStringLiteral("serve"),
-                                QStringLiteral("--listen"), QStringLiteral("127.0.0.1:0"),
-                                QStringLiteral("--status"), QStringLiteral("127.0.0.1:0")};
-        mServer->start(QStringLiteral("sh"),
-                       QStringList{QStringLiteral("-c"), command, QStringLiteral(KDD_BINARY)} + words +
-                           options);
+        const QByteArray command = shell + " exec setsid " + runner + " " KDD_BINARY " --json --store " +
+                                   path("store").toUtf8() +
+                                   " serve --listen 127.0.0.1:0 --status 127.0.0.1:0 " + options;
+        mServer->start(QStringLiteral("sh"), {QStringLiteral("-c"), QString::fromUtf8(command)});
         ASSERT_TRUE(mServer->waitForReadyRead(kTimeout)) << fileContent(path("log")).toStdString();
-        const QJsonObject told = QJsonDocument::fromJson(mServer->readLine()).object();
-        mAddress = told.value(QLatin1String("address")).toString().toLatin1();
-        mStatus = told.value(QLatin1String("status")).toString().toLatin1();
-        mDicom = told.value(QLatin1String("dicom")).toString().toLatin1();
+        const QByteArray told = mServer->readLine();
+        mAddress = jsonAt(told, "address").toString().toLatin1();
+        mStatus = jsonAt(told, "status").toString().toLatin1();
+        mDicom = jsonAt(told, "dicom").toString().toLatin1();
     }
 
     void signal(int number) const { ::kill(static_cast<pid_t>(mServer->processId()), number); }
@@ -57,15 +52,23 @@ protected:
     Reply get(const QByteArray& target, const QByteArray& headers = {}) const
     {
         Client client(mAddress);
-        client.get("/dicom-web/" + target, headers);
+        return client.ask("/dicom-web/" + target, headers);
+    }
+
+    /// With a body.
+    Reply ask(const QByteArray& method, const QByteArray& target, const QByteArray& type,
+              const QByteArray& body) const
+    {
+        Client client(mAddress);
+        client.send(method + " /dicom-web/" + target + " HTTP/1.1\r\nHost: localhost\r\nContent-Type: " +
+                    type + "\r\nContent-Length: " + QByteArray::number(body.size()) + "\r\n\r\n" + body);
         return client.reply();
     }
 
     Reply status(const char* page) const
     {
         Client client(mStatus);
-        client.get(page);
-        return client.reply();
+        return client.ask(page);
     }
 
     qint64 openDescriptors() const

@@ -42,13 +42,10 @@ protected:
     /// Gives all images of the study another name.
     void rename(int name) const
     {
-        put("job.xml", "<Job><Timestamp>20240131120000</Timestamp><Substitutions><Tag Group='0010' "
-                       "Element='0010'><Value>" +
-                           QByteArray::number(name) + "</Value></Tag></Substitutions></Job>");
-        QByteArray arguments = "qa @job.xml --study 1.2";
+        QByteArray arguments = "qa " + job(DCM_PatientName, QByteArray::number(name)) + " --study 1.2";
         for (int i = 1; i <= kImages; ++i)
             arguments += " --image 1.2.3." + QByteArray::number(i);
-        const Answer answer = kdd(arguments.constData());
+        const Answer answer = kdd(arguments);
         ASSERT_EQ(answer.exitCode, 0) << answer.err.toStdString();
     }
 
@@ -56,16 +53,8 @@ protected:
     static QStringList namesIn(const QByteArray& json)
     {
         QStringList names;
-        for (const QJsonValue& image : QJsonDocument::fromJson(json).array())
-            names.append(image.toObject()
-                             .value(QLatin1String("00100010"))
-                             .toObject()
-                             .value(QLatin1String("Value"))
-                             .toArray()
-                             .first()
-                             .toObject()
-                             .value(QLatin1String("Alphabetic"))
-                             .toString());
+        for (const QJsonValue& image : jsonAt(json).toArray())
+            names.append(jsonAt(image, "00100010/Value/0/Alphabetic").toString());
         names.removeDuplicates();
         return names;
     }
@@ -101,7 +90,7 @@ protected:
 TEST_F(StudyFaults, EachAnswerIsOneStateWhileOthersChangeTheStudy)
 {
     addStudy();
-    serve({QStringLiteral("--threads"), QStringLiteral("4")});
+    serve("--threads 4");
     std::atomic<bool> isDone{false};
     onThreads(4, [&](int thread) {
         if (thread != 0)
@@ -123,7 +112,7 @@ TEST_F(StudyFaults, AStudyThatWaitsForItsFirstBuildIsNotSaidToBeAbsent)
 {
     saveImage(1);
     ASSERT_EQ(kdd("index @").exitCode, 0);
-    serve({QStringLiteral("--corrections")});
+    serve("--corrections");
     EXPECT_TRUE(get("studies").body.contains("\"1.2\""));
     const QByteArrayList targets = {"studies/1.2/metadata", "studies/1.2/instances",
                                     "studies/1.2/corrections", "studies/1.2/series/1.2.4/instances/1.2.3.1"};
@@ -148,15 +137,12 @@ TEST_F(StudyFaults, WhatBecomesOfATagFileShowsAtOnce)
     putFile(tagFile(), older);
     const Reply restored = get("studies/1.2/metadata");
     EXPECT_TRUE(restored.body == first.body && restored.header("ETag") == first.header("ETag"));
-    const struct
-    {
-        QByteArray content;
-        int status;
-    } kFaults[] = {{older.left(older.size() / 2), 500}, {"nonsense", 500}, {QByteArray(), 503}};
-    for (const auto& fault : kFaults) {
-        putFile(tagFile(), fault.content);
-        EXPECT_EQ(get("studies/1.2/metadata").status, fault.status) << fault.content.size();
-        EXPECT_EQ(get("studies/1.2/series/1.2.3/instances/1.2.3.2/frames/1").status, fault.status);
+    const std::pair<QByteArray, int> kFaults[] = {
+        {older.left(older.size() / 2), 500}, {"nonsense", 500}, {QByteArray(), 503}};
+    for (const auto& [content, status] : kFaults) {
+        putFile(tagFile(), content);
+        EXPECT_EQ(get("studies/1.2/metadata").status, status) << content.size();
+        EXPECT_EQ(get("studies/1.2/series/1.2.3/instances/1.2.3.2/frames/1").status, status);
         EXPECT_EQ(get("studies").status, 200) << "the list stays";
     }
     QFile::remove(tagFile());

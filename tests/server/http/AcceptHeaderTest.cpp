@@ -1,7 +1,8 @@
 #include "server/http/AcceptHeader.h"
 
-#include <gtest/gtest.h>
+#include "server/Handled.h"
 
+using namespace Kdd;
 using namespace Kdd::Http;
 
 namespace
@@ -12,13 +13,8 @@ const QVector<MediaType> kOffers = {{"application/dicom+json", ""},
                                     {"multipart/related", "application/octet-stream"},
                                     {"image/jpeg", ""}};
 
-struct Choice
-{
-    const char* accept;
-    int offer;  // index in kOffers
-};
-
-constexpr Choice kChoices[] = {
+/// What is accepted and which of the offers is chosen.
+const std::pair<const char*, int> kChoices[] = {
     {"*/*", 0},
     {"", -1},
     {"application/dicom+json", 0},
@@ -43,8 +39,8 @@ constexpr Choice kChoices[] = {
 
 TEST(AcceptHeader, ChoosesWhatIsMostWelcome)
 {
-    for (const Choice& each : kChoices)
-        EXPECT_EQ(AcceptHeader(QByteArray(each.accept)).choose(kOffers), each.offer) << each.accept;
+    for (const auto& [accept, offer] : kChoices)
+        EXPECT_EQ(AcceptHeader(QByteArray(accept)).choose(kOffers), offer) << accept;
 }
 
 TEST(AcceptHeader, TellsTheTransferSyntaxBestFirst)
@@ -60,27 +56,21 @@ TEST(AcceptHeader, TellsTheTransferSyntaxBestFirst)
 
 TEST(AcceptHeader, IsOverruledByTheParameter)
 {
-    Request request;
-    EXPECT_EQ(AcceptHeader::of(request).choose(kOffers), 0);
-    request.headers = {{"accept", "text/html"}};
-    EXPECT_EQ(AcceptHeader::of(request).choose(kOffers), -1);
-    request.query = {{"accept", "image/jpeg"}};
-    EXPECT_EQ(AcceptHeader::of(request).choose(kOffers), 3);
+    const auto chosen = [](const char* target, const Headers& headers) {
+        return AcceptHeader::of(requestFor(target, headers)).choose(kOffers);
+    };
+    EXPECT_EQ(chosen("", {}), 0);
+    EXPECT_EQ(chosen("", {{"accept", "text/html"}}), -1);
+    EXPECT_EQ(chosen("?accept=image/jpeg", {{"accept", "text/html"}}), 3);
 }
 
 TEST(AcceptHeader, KnowsContentCodings)
 {
-    const struct
-    {
-        const char* header;
-        bool isAccepted;
-    } cases[] = {
+    const std::tuple<const char*, bool> cases[] = {
         {"gzip, deflate, br", true}, {"GZIP;q=0.5", true},           {"gzip;q=0, *", false}, {"*", true},
         {"*, gzip;q=0", false},      {"identity;q=1, *;q=0", false}, {"br", false},          {"", false}};
-    for (const auto& each : cases) {
-        Request request;
-        request.headers = {{"accept-encoding", each.header}};
-        EXPECT_EQ(acceptsCoding(request, "gzip"), each.isAccepted) << each.header;
+    for (const auto& [header, isAccepted] : cases) {
+        EXPECT_EQ(acceptsCoding(requestFor("", {{"accept-encoding", header}}), "gzip"), isAccepted) << header;
     }
 }
 

@@ -72,8 +72,7 @@ TEST_F(HttpBodies, ConsistOfBytesRangesAndBlocksInTheirOrder)
     const QByteArray content = numbered(300'001);
     const auto file = aFile(content);
     const auto answer = [&](const Http::Request& request) {
-        Http::Response response(200);
-        response.body.emplace_back(QByteArray("--first\r\n"));
+        Http::Response response = answerOf(QByteArray("--first\r\n"));
         response.body.emplace_back(Http::FileRange{file, 7, 200'001});
         response.body.emplace_back(Http::FileRange{file, 300'001, 0});
         response.body.emplace_back(QByteArray(100'000, '-'));
@@ -94,12 +93,10 @@ TEST_F(HttpBodies, ConsistOfBytesRangesAndBlocksInTheirOrder)
     EXPECT_TRUE(encrypted.address().startsWith("https://"));
     Client clients[] = {Client(plain.address()), Client(encrypted.address(), Client::Tls::Yes)};
     for (Client& client : clients) {
-        client.get("/known");
-        const Reply known = client.reply();
+        const Reply known = client.ask("/known");
         EXPECT_EQ(known.header("Content-Length"), QByteArray::number(parts.size()));
         EXPECT_TRUE(known.isWhole && known.body == parts);
-        client.get("/blocks");
-        const Reply blocks = client.reply();
+        const Reply blocks = client.ask("/blocks");
         EXPECT_EQ(blocks.header("Content-Length"), "");
         EXPECT_TRUE(blocks.isWhole && blocks.body == parts + Blocks::all(3));
         client.send("GET /blocks HTTP/1.0\r\nHost: localhost\r\nConnection: keep-alive\r\n\r\n");
@@ -139,11 +136,7 @@ TEST_F(HttpBodies, OfAFileThatIsCutEndEarlyWithoutOtherBytes)
     constexpr int kSize = 48 * 1024 * 1024;
     const QByteArray content = numbered(kSize);
     const auto file = aFile(content);
-    RunningServer server([&](const Http::Request&) {
-        Http::Response response(200);
-        response.body.emplace_back(Http::FileRange{file, 0, kSize});
-        return response;
-    });
+    RunningServer server([&](const Http::Request&) { return answerOf(Http::FileRange{file, 0, kSize}); });
     Client client(server.address(), Client::Tls::No, 65536);
     client.get("/");
     // As soon as the client has the head, the system holds the first megabytes and the rest is still in the file.
@@ -164,8 +157,7 @@ TEST_F(HttpBodies, ThatCannotBeMadeEndEarly)
         Result next(QByteArray&) override { throw std::runtime_error("there is no more"); }
     };
     RunningServer server([](const Http::Request& request) {
-        Http::Response response(200);
-        response.body.emplace_back(std::make_unique<Blocks>(0));
+        Http::Response response = answerOf(std::make_unique<Blocks>(0));
         if (request.path.value(0) == "throw")
             response.body.emplace_back(std::make_unique<Throwing>());
         else
@@ -175,8 +167,7 @@ TEST_F(HttpBodies, ThatCannotBeMadeEndEarly)
     std::size_t count = 0;
     for (const char* path : {"/fail", "/throw"}) {
         Client client(server.address());
-        client.get(path);
-        const Reply reply = client.reply();
+        const Reply reply = client.ask(path);
         EXPECT_EQ(reply.status, 200);
         EXPECT_FALSE(reply.isWhole);
         EXPECT_EQ(server.exchanges(++count).back().fault, QStringLiteral("there is no more"));
@@ -199,13 +190,11 @@ TEST_F(HttpBodies, AndHeadersThatCannotBeSentAreReplaced)
     });
     Client client(server.address());
     for (const char* path : {"/value", "/name", "/3", "/-1"}) {
-        client.get(path);
-        const Reply reply = client.reply();
+        const Reply reply = client.ask(path);
         EXPECT_EQ(reply.status, 500) << path;
         EXPECT_EQ(reply.header("Set-Cookie"), "");
     }
-    client.get("/2");
-    EXPECT_EQ(client.reply().body, "45");
+    EXPECT_EQ(client.ask("/2").body, "45");
 }
 
 TEST_F(HttpBodies, OfClientsThatDoNotReadTakeLittleMemoryAndHoldUpNobody)
@@ -213,17 +202,12 @@ TEST_F(HttpBodies, OfClientsThatDoNotReadTakeLittleMemoryAndHoldUpNobody)
     constexpr int kClients = 1000;
     constexpr int kBlocks = 1000;
     std::atomic<int> made = 0;
-    Http::HttpSettings settings;
-    settings.requests = kClients;
     RunningServer server(
         [&](const Http::Request& request) {
-            if (request.path.value(0) == "a")
-                return Http::textResponse(200, "text/plain", "a");
-            Http::Response response(200);
-            response.body.emplace_back(std::make_unique<Blocks>(kBlocks, &made));
-            return response;
+            return request.path.value(0) == "a" ? Http::textResponse(200, "text/plain", "a")
+                                                : answerOf(std::make_unique<Blocks>(kBlocks, &made));
         },
-        settings);
+        with(&Http::HttpSettings::requests, kClients));
     const qint64 before = residentMemory();
     std::vector<std::unique_ptr<Client>> clients;
     for (int i = 0; i < kClients; ++i) {
@@ -233,23 +217,15 @@ TEST_F(HttpBodies, OfClientsThatDoNotReadTakeLittleMemoryAndHoldUpNobody)
     for (const auto& client : clients)
         EXPECT_EQ(client->reply(Client::Body::StaysBehind).status, 200);
     Client another(server.address());
-    another.get("/a");
-    EXPECT_EQ(another.reply().body, "a");
+    EXPECT_EQ(another.ask("/a").body, "a");
     EXPECT_LT(made, kClients * kBlocks / 2) << "blocks are made as clients take them";
     EXPECT_LT(residentMemory() - before, 200 * 1024) << "of 64 MiB for each client";
 }
 
 TEST_F(HttpBodies, OfAClientThatTakesNothingAreBrokenOff)
 {
-    Http::HttpSettings settings;
-    settings.patience = std::chrono::milliseconds(1000);
-    RunningServer server(
-        [](const Http::Request&) {
-            Http::Response response(200);
-            response.body.emplace_back(std::make_unique<Blocks>(1000));
-            return response;
-        },
-        settings);
+    RunningServer server([](const Http::Request&) { return answerOf(std::make_unique<Blocks>(1000)); },
+                         with(&Http::HttpSettings::patience, std::chrono::milliseconds(1000)));
     Client client(server.address(), Client::Tls::No, 4096);
     client.get("/");
     const std::vector<Http::Exchange> ended = server.exchanges(1);

@@ -64,6 +64,13 @@ public:
     /// The next answer.
     Reply reply(Body body = Body::Follows);
 
+    /// The answer to a request of its own.
+    Reply ask(const QByteArray& path, const QByteArray& headers = {})
+    {
+        get(path, headers);
+        return reply();
+    }
+
     /// What follows an answer that was received without its body.
     Reply bodyAfter(Reply head);
 

@@ -17,22 +17,10 @@ Http::Response pathAsText(const Http::Request& request)
     return Http::textResponse(200, "text/plain", request.path.value(0));
 }
 
-Http::HttpSettings withPatience(int ms)
-{
-    Http::HttpSettings settings;
-    settings.patience = std::chrono::milliseconds(ms);
-    settings.idle = settings.patience;
-    return settings;
-}
-
 TEST(HttpLimits, AreToldToWhoeverGoesBeyondThem)
 {
     const QByteArray start = "GET / HTTP/1.1\r\nHost: localhost\r\n";
-    const struct
-    {
-        QByteArray request;
-        int status;
-    } kRequests[] = {
+    const std::pair<QByteArray, int> kRequests[] = {
         {"nonsense\r\n\r\n", 400},
         {"GET / HTTP/1.1\r\n\r\n", 400},
         {start + "Host: elsewhere\r\n\r\n", 400},
@@ -51,11 +39,11 @@ TEST(HttpLimits, AreToldToWhoeverGoesBeyondThem)
         {"GET / HTTP/2.0\r\n\r\n", 505},
     };
     RunningServer server(pathAsText);
-    for (const auto& each : kRequests) {
+    for (const auto& [request, status] : kRequests) {
         Client client(server.address());
-        client.send(each.request);
+        client.send(request);
         const Reply reply = client.reply();
-        EXPECT_EQ(reply.status, each.status) << each.request.left(60).constData();
+        EXPECT_EQ(reply.status, status) << request.left(60).constData();
         EXPECT_EQ(reply.header("Connection"), "close");
         EXPECT_TRUE(reply.isWhole && !reply.body.isEmpty());
         EXPECT_EQ(client.rest(), "");
@@ -78,7 +66,9 @@ TEST(HttpLimits, LetABodyOfAGetPassUnread)
 
 TEST(HttpLimits, EndWhatDoesNotComeInTime)
 {
-    RunningServer server(pathAsText, withPatience(1000));
+    Http::HttpSettings impatient;
+    impatient.patience = impatient.idle = std::chrono::milliseconds(1000);
+    RunningServer server(pathAsText, impatient);
     Client silent(server.address());
     Client slow(server.address());
     slow.send("GET / HTTP/1.1\r\nHost: loc");
@@ -89,51 +79,42 @@ TEST(HttpLimits, EndWhatDoesNotComeInTime)
     EXPECT_EQ(slow.rest(), "");
     EXPECT_EQ(silent.rest(), "") << "who asked for nothing is told nothing";
     Client kept(server.address());
-    kept.get("/a");
-    EXPECT_EQ(kept.reply().body, "a");
+    EXPECT_EQ(kept.ask("/a").body, "a");
     EXPECT_EQ(kept.rest(), "");
 }
 
 TEST(HttpLimits, TellThatThereAreTooManyConnections)
 {
-    Http::HttpSettings settings;
-    settings.connections = 1;
-    RunningServer server(pathAsText, settings);
+    RunningServer server(pathAsText, with(&Http::HttpSettings::connections, 1));
     Client first(server.address());
-    first.get("/a");
-    EXPECT_EQ(first.reply().body, "a");
+    EXPECT_EQ(first.ask("/a").body, "a");
     Client second(server.address());
     const Reply reply = second.reply();
     EXPECT_EQ(reply.status, 503);
     EXPECT_EQ(reply.header("Retry-After"), "1");
     EXPECT_EQ(second.rest(), "");
-    first.get("/b");
-    EXPECT_EQ(first.reply().body, "b");
+    EXPECT_EQ(first.ask("/b").body, "b");
 }
 
 TEST(HttpLimits, TellThatThereAreTooManyRequests)
 {
     Gate gate;
-    Http::HttpSettings settings;
-    settings.requests = 1;
     RunningServer server(
         [&](const Http::Request& request) {
             gate.pass();
             return pathAsText(request);
         },
-        settings);
+        with(&Http::HttpSettings::requests, 1));
     Client first(server.address());
     first.get("/a");
     gate.awaitThread();
     Client second(server.address());
-    second.get("/b");
-    const Reply refused = second.reply();
+    const Reply refused = second.ask("/b");
     EXPECT_EQ(refused.status, 503);
     EXPECT_EQ(refused.header("Retry-After"), "1");
     gate.open();
     EXPECT_EQ(first.reply().body, "a");
-    second.get("/b");
-    EXPECT_EQ(second.reply().body, "b") << "the connection stays";
+    EXPECT_EQ(second.ask("/b").body, "b") << "the connection stays";
 }
 
 TEST(HttpLimits, LetTenThousandConnectionsRest)
@@ -145,9 +126,7 @@ TEST(HttpLimits, LetTenThousandConnectionsRest)
     ::setrlimit(RLIMIT_NOFILE, &limit);
     if (limit.rlim_max < kConnections + 300)
         GTEST_SKIP() << "a process has " << limit.rlim_max << " descriptors here";
-    Http::HttpSettings settings;
-    settings.connections = kConnections + 1;
-    RunningServer server(pathAsText, settings);
+    RunningServer server(pathAsText, with(&Http::HttpSettings::connections, kConnections + 1));
     // The clients have descriptors of their own.
     const bool isServed = inChild([&] {
         std::vector<std::unique_ptr<Client>> clients;

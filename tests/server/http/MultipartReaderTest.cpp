@@ -50,12 +50,7 @@ Read read(const QByteArray& body, int step)
 
 const QByteArray kOne = "--ab\r\nA: b\r\n\r\n";
 
-const struct
-{
-    QByteArray body;
-    const char* parts;
-    bool isComplete;
-} kBodies[] = {
+const std::tuple<QByteArray, const char*, bool> kBodies[] = {
     {kOne + "x\r\n--ab--\r\nepilogue --ab\r\n", "(a=b)x;", true},
     {"\r\n" + kOne + "x\r\n--ab--", "(a=b)x;", true},
     {"preamble --ab\r\n--abc\r\n" + kOne + "x\r\n--ab--", "(a=b)x;", true},
@@ -72,13 +67,13 @@ const struct
 
 TEST(MultipartReader, FindsThePartsHoweverTheBytesCome)
 {
-    for (const auto& each : kBodies) {
+    for (const auto& [body, parts, isComplete] : kBodies) {
         for (const int step : {1, 2, 3, 5, 11, 17, 1000}) {
-            const Read found = read(each.body, step);
-            EXPECT_TRUE(found.parts == each.parts || (!each.isComplete && found.parts.find(each.parts) == 0 &&
-                                                      each.body.contains(found.parts.substr(5).c_str())))
-                << found.parts << " of " << each.body.constData() << " by " << step;
-            EXPECT_EQ(found.isComplete, each.isComplete) << each.body.constData();
+            const Read found = read(body, step);
+            EXPECT_TRUE(found.parts == parts || (!isComplete && found.parts.find(parts) == 0 &&
+                                                 body.contains(found.parts.substr(5).c_str())))
+                << found.parts << " of " << body.constData() << " by " << step;
+            EXPECT_EQ(found.isComplete, isComplete) << body.constData();
             EXPECT_EQ(found.fault, "");
         }
     }
@@ -87,31 +82,21 @@ TEST(MultipartReader, FindsThePartsHoweverTheBytesCome)
 TEST(MultipartReader, TakesNoMoreThanItHasTo)
 {
     const QByteArray part = "\r\n" + kOne + "x";
-    const struct
-    {
-        QByteArray body;
-        const char* fault;
-    } kHostile[] = {
+    const std::pair<QByteArray, const char*> kHostile[] = {
         {QByteArray(70000, 'x'), "does not begin with a part"},
         {"--ab\r\na: " + QByteArray(20000, 'x'), "header of a part is too large"},
         {"--ab\r\n" + QByteArray("a: b\r\n").repeated(4000) + "\r\n", "header of a part is too large"},
         {part.repeated(5), "more parts"},
     };
-    for (const auto& each : kHostile) {
+    for (const auto& [body, fault] : kHostile) {
         for (const int step : {1000, 1000000})
-            EXPECT_NE(read(each.body, step).fault.find(each.fault), std::string::npos) << each.fault;
+            EXPECT_NE(read(body, step).fault.find(fault), std::string::npos) << fault;
     }
 }
 
 TEST(ContentType, IsReadWithAndWithoutQuotes)
 {
-    const struct
-    {
-        const char* header;
-        const char* name;
-        const char* type;
-        const char* boundary;
-    } kHeaders[] = {
+    const std::tuple<const char*, const char*, const char*, const char*> kHeaders[] = {
         {"multipart/related; type=\"application/dicom\"; boundary=abc", "multipart/related",
          "application/dicom", "abc"},
         {"Multipart/Related;Type=application/dicom;Boundary=\"a;b=\\\"c\"", "multipart/related",
@@ -121,11 +106,11 @@ TEST(ContentType, IsReadWithAndWithoutQuotes)
         {"nothing; boundary", "", "", ""},
         {"", "", "", ""},
     };
-    for (const auto& each : kHeaders) {
-        const ContentType type = ContentType::parse(each.header);
-        EXPECT_EQ(type.name, each.name) << each.header;
-        EXPECT_EQ(type.parameter("type"), each.type) << each.header;
-        EXPECT_EQ(type.parameter("boundary"), each.boundary) << each.header;
+    for (const auto& [header, name, inner, boundary] : kHeaders) {
+        const ContentType type = ContentType::parse(header);
+        EXPECT_EQ(type.name, name) << header;
+        EXPECT_EQ(type.parameter("type"), inner) << header;
+        EXPECT_EQ(type.parameter("boundary"), boundary) << header;
     }
 }
 

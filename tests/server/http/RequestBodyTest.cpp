@@ -63,10 +63,9 @@ class RequestBody : public testing::Test
 protected:
     explicit RequestBody(int patience = 20000)
     {
-        Http::HttpSettings settings;
-        settings.patience = std::chrono::milliseconds(patience);
         mServer = std::make_unique<RunningServer>(
-            [this](const Http::Request& request) { return answer(request); }, settings);
+            [this](const Http::Request& request) { return answer(request); },
+            with(&Http::HttpSettings::patience, std::chrono::milliseconds(patience)));
     }
 
     Http::Response answer(const Http::Request& request)

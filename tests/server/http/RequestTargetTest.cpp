@@ -26,11 +26,7 @@ std::string partsOf(const QByteArray& target)
 
 TEST(RequestTarget, IsTakenApartAndDecoded)
 {
-    const struct
-    {
-        const char* target;
-        const char* parts;
-    } kTargets[] = {
+    const std::pair<const char*, const char*> kTargets[] = {
         {"/", "||"},
         {"*", "||"},
         {"/dicom-web/studies?limit=5&limit=6", "|dicom-web/studies|limit=5&limit=6"},
@@ -43,8 +39,8 @@ TEST(RequestTarget, IsTakenApartAndDecoded)
         {"https://[::1]", "[::1]||"},
         {"/...", "|...|"},
     };
-    for (const auto& each : kTargets)
-        EXPECT_EQ(partsOf(each.target), each.parts) << each.target;
+    for (const auto& [target, parts] : kTargets)
+        EXPECT_EQ(partsOf(target), parts) << target;
 }
 
 TEST(RequestTarget, ThatClimbsOrCannotBeDecodedIsRefused)

@@ -1,12 +1,10 @@
+#include "server/Handled.h"
 #include "server/http/MultipartWriter.h"
 #include "server/http/RangeHeader.h"
 #include "server/http/ZipStream.h"
+#include "support/FileContent.h"
 
-#include <QFile>
 #include <QProcess>
-#include <QTemporaryDir>
-
-#include <gtest/gtest.h>
 
 using namespace Kdd;
 using namespace Kdd::Http;
@@ -15,13 +13,7 @@ namespace
 {
 
 /// What stands in Range, and what is meant of ten bytes: "offset+length", "all" or "none".
-struct RangeRow
-{
-    const char* range;
-    const char* wanted;
-};
-
-const RangeRow kRanges[] = {
+const std::pair<const char*, const char*> kRanges[] = {
     {"", "all"},
     {"bytes=0-3", "0+4"},
     {"bytes=4-", "4+6"},
@@ -49,17 +41,14 @@ QByteArray textOf(const WantedBytes& wanted)
 
 TEST(RangeHeader, IsHeldAgainstTheLengthOfTheBody)
 {
-    for (const RangeRow& row : kRanges) {
-        Request request;
-        request.headers = {{"range", row.range}};
-        EXPECT_EQ(textOf(wantedBytes(request, 10, "\"a\"")), row.wanted) << row.range;
+    for (const auto& [range, wanted] : kRanges) {
+        EXPECT_EQ(textOf(wantedBytes(requestFor("", {{"range", range}}), 10, "\"a\"")), wanted) << range;
     }
 }
 
 TEST(RangeHeader, CountsOnlyForTheStateThatIfRangeNames)
 {
-    Request request;
-    request.headers = {{"range", "bytes=0-3"}, {"if-range", "\"a\""}};
+    const Request request = requestFor("", {{"range", "bytes=0-3"}, {"if-range", "\"a\""}});
     EXPECT_EQ(textOf(wantedBytes(request, 10, "\"a\"")), "0+4");
     EXPECT_EQ(textOf(wantedBytes(request, 10, "\"b\"")), "all");
     EXPECT_EQ(textOf(wantedBytes(request, 10, "")), "all");
@@ -88,14 +77,14 @@ TEST(ZipStream, IsUnpackedByOthers)
         bytes += content + zip.end();
     }
     bytes += zip.finish();
-    QFile file(folder.filePath(QStringLiteral("a.zip")));
-    ASSERT_TRUE(file.open(QIODevice::WriteOnly) && file.write(bytes) == bytes.size() && file.flush());
+    const QString file = folder.filePath(QStringLiteral("a.zip"));
+    putFile(file, bytes);
     QProcess python;
     python.start(QStringLiteral("python3"),
                  {QStringLiteral("-c"),
                   QStringLiteral("import sys,zipfile; z=zipfile.ZipFile(sys.argv[1]); print(z.testzip(), "
                                  "[(i.filename,i.file_size) for i in z.infolist()])"),
-                  file.fileName()});
+                  file});
     ASSERT_TRUE(python.waitForFinished());
     EXPECT_EQ(python.readAllStandardOutput().trimmed(),
               "None [('1.2/a.dcm', 100000), ('1.2/b.dcm', 100000), ('1.2/empty.dcm', 0)]");

@@ -11,6 +11,24 @@
 namespace Kdd
 {
 
+/// Settings of which one is as a test wants it: with(&Http::HttpSettings::requests, 1).
+template <typename Value, typename Given>
+Http::HttpSettings with(Value Http::HttpSettings::*setting, Given value)
+{
+    Http::HttpSettings settings;
+    settings.*setting = value;
+    return settings;
+}
+
+/// An answer whose body is this part.
+template <typename Part>
+Http::Response answerOf(Part part)
+{
+    Http::Response response(200);
+    response.body.emplace_back(std::move(part));
+    return response;
+}
+
 /// A server on a free port that answers by a function and keeps what it was told of.
 class RunningServer : private Http::Handler, private Http::ExchangeObserver
 {

@@ -47,14 +47,13 @@ TEST(HttpServer, NamesEachRequest)
     const QByteArray tail = " 127.0.0.1 http://localhost";
     std::set<QByteArray> ids;
     for (const QByteArray given : {"", "a b", "<script>"}) {
-        client.get("/", given.isEmpty() ? QByteArray() : "X-Request-Id: " + given + "\r\n");
-        const Reply reply = client.reply();
+        const Reply reply =
+            client.ask("/", given.isEmpty() ? QByteArray() : "X-Request-Id: " + given + "\r\n");
         const QByteArray id = reply.header("X-Request-Id");
         EXPECT_TRUE(ids.insert(id).second && !id.isEmpty() && id != given);
         EXPECT_EQ(reply.body, id + tail);
     }
-    client.get("/", "X-Request-Id: Viewer-1.2_3\r\n");
-    EXPECT_EQ(client.reply().body, "Viewer-1.2_3" + tail);
+    EXPECT_EQ(client.ask("/", "X-Request-Id: Viewer-1.2_3\r\n").body, "Viewer-1.2_3" + tail);
 }
 
 TEST(HttpServer, AnswersFiveHundredWhereAHandlerThrows)
@@ -63,8 +62,7 @@ TEST(HttpServer, AnswersFiveHundredWhereAHandlerThrows)
     RunningServer server(
         [](const Http::Request&) -> Http::Response { throw std::runtime_error("secret path"); });
     Client client(server.address());
-    client.get("/");
-    const Reply reply = client.reply();
+    const Reply reply = client.ask("/");
     EXPECT_EQ(reply.status, 500);
     EXPECT_FALSE(reply.body.contains("secret"));
     EXPECT_EQ(server.exchanges(1)[0].status, 500);
@@ -80,8 +78,7 @@ TEST(HttpServer, AnswersWhatIsInFlightWhenItStops)
         return targetAsText(request);
     });
     Client resting(server.address());
-    resting.get("/a");
-    EXPECT_EQ(resting.reply().body, "/a");
+    EXPECT_EQ(resting.ask("/a").body, "/a");
     Client half(server.address());
     half.send("GET /b HT");
     Client waiting(server.address());
@@ -112,15 +109,8 @@ public:
 
 TEST(HttpServer, StopsWithoutThoseWhoTakeTooLong)
 {
-    Http::HttpSettings settings;
-    settings.stop = std::chrono::milliseconds(50);
-    RunningServer server(
-        [](const Http::Request&) {
-            Http::Response response(200);
-            response.body.emplace_back(std::make_unique<Endless>());
-            return response;
-        },
-        settings);
+    RunningServer server([](const Http::Request&) { return answerOf(std::make_unique<Endless>()); },
+                         with(&Http::HttpSettings::stop, std::chrono::milliseconds(50)));
     Client client(server.address(), Client::Tls::No, 4096);
     client.get("/");
     EXPECT_EQ(client.reply(Client::Body::StaysBehind).status, 200);
@@ -135,13 +125,7 @@ TEST(HttpServer, SaysWhyItCannotBegin)
     RunningServer taken(targetAsText);
     Http::ListenAddress address;
     ASSERT_TRUE(Http::ListenAddress::parse(taken.address().mid(7), address));
-    const struct
-    {
-        Http::ListenAddress address;
-        QByteArray certificate;
-        QByteArray key;
-        QByteArray named;
-    } kFaults[] = {
+    const std::tuple<Http::ListenAddress, QByteArray, QByteArray, QByteArray> kFaults[] = {
         {address, {}, {}, address.text()},
         {{"127.0.0.1", 0}, "/nowhere.pem", tls.key(), "/nowhere.pem"},
         {{"127.0.0.1", 0}, tls.certificate(), "/nowhere.pem", "/nowhere.pem"},
@@ -152,35 +136,30 @@ TEST(HttpServer, SaysWhyItCannotBegin)
         Http::Response answer(const Http::Request&) override { return Http::Response(204); }
         void ended(const Http::Exchange&) override {}
     } nobody;
-    for (const auto& fault : kFaults) {
+    for (const auto& [at, certificate, key, named] : kFaults) {
         Http::HttpSettings settings;
-        settings.address = fault.address;
-        settings.certificateFile = fault.certificate;
-        settings.keyFile = fault.key;
+        settings.address = at;
+        settings.certificateFile = certificate;
+        settings.keyFile = key;
         Http::HttpServer server(settings, nobody, nobody);
         const std::string reason = server.start().text().toStdString();
-        EXPECT_NE(reason.find(fault.named.toStdString()), std::string::npos) << reason;
+        EXPECT_NE(reason.find(named.toStdString()), std::string::npos) << reason;
     }
 }
 
 TEST(ListenAddress, IsReadAndSaysWhoReachesIt)
 {
-    const struct
-    {
-        const char* text;
-        const char* shown;
-        bool isLoopback;
-    } kAddresses[] = {
+    const std::tuple<const char*, const char*, bool> kAddresses[] = {
         {"127.0.0.1:8042", "127.0.0.1:8042", true}, {"127.1.2.3:1", "127.1.2.3:1", true},
         {"localhost:0", "127.0.0.1:0", true},       {"[::1]:65535", "[::1]:65535", true},
         {"0.0.0.0:80", "0.0.0.0:80", false},        {"[::]:80", "[::]:80", false},
         {"10.0.0.1:80", "10.0.0.1:80", false},      {"[::ffff:10.0.0.1]:80", "[::ffff:10.0.0.1]:80", false},
     };
     Http::ListenAddress address;
-    for (const auto& each : kAddresses) {
-        EXPECT_TRUE(Http::ListenAddress::parse(each.text, address)) << each.text;
-        EXPECT_EQ(address.text(), each.shown);
-        EXPECT_EQ(address.isLoopback(), each.isLoopback) << each.text;
+    for (const auto& [given, shown, isLoopback] : kAddresses) {
+        EXPECT_TRUE(Http::ListenAddress::parse(given, address)) << given;
+        EXPECT_EQ(address.text(), shown);
+        EXPECT_EQ(address.isLoopback(), isLoopback) << given;
     }
     for (const char* text :
          {"", "8042", ":8042", "127.0.0.1", "127.0.0.1:", "127.0.0.1:65536", "127.0.0.1:-1", "::1:80",

@@ -1,3 +1,4 @@
+#include "server/Handled.h"
 #include "server/dicomweb/render/RenderedResource.h"
 #include "server/dicomweb/render/ThumbnailResource.h"
 #include "support/DatasetBuilder.h"
@@ -30,7 +31,7 @@ DatasetBuilder aGreyImage()
     for (int frame = 0; frame < kFrames; ++frame)
         for (int i = 0; i < kSide * kSide; ++i)
             pixels.push_back(static_cast<Uint16>(frame * 100 + i));
-    DatasetBuilder image = anImage("1.4").inStudy("1.2").inSeries("1.3");
+    DatasetBuilder image = anImage("1.4").inSeries("1.3");
     return image.asPicture(kSide, kSide, 16).with(DCM_NumberOfFrames, "3").words(pixels);
 }
 
@@ -58,25 +59,19 @@ protected:
     Http::Response ask(const QByteArray& what, QVector<Http::Field> query = {},
                        const char* accept = "image/png")
     {
-        Http::Request request;
+        Http::Request request = requestFor(what.startsWith("studies") ? what : kPath + what,
+                                           {{"accept", accept}, {"if-none-match", mHeld}});
         request.query = std::move(query);
-        request.headers = {{"accept", accept}, {"if-none-match", mHeld}};
         ResourcePath path;
-        EXPECT_TRUE(ResourcePath::parse(
-            (what.startsWith("studies") ? what : kPath + what).split('/').toVector(), path));
+        EXPECT_TRUE(ResourcePath::parse(request.path, path));
         return mRendered.owns(path) ? mRendered.answer(request, path) : mThumbnail.answer(request, path);
-    }
-
-    static QByteArray body(const Http::Response& response)
-    {
-        return response.body.empty() ? QByteArray() : std::get<QByteArray>(response.body.front());
     }
 
     QImage picture(const QByteArray& what, QVector<Http::Field> query = {})
     {
         const Http::Response response = ask(what, std::move(query));
-        EXPECT_EQ(response.status, 200) << what.constData() << ": " << body(response).constData();
-        return QImage::fromData(body(response));
+        EXPECT_EQ(response.status, 200) << what.constData() << ": " << bodyOf(response).constData();
+        return QImage::fromData(bodyOf(response));
     }
 
     TemporaryStore mStore;
@@ -92,21 +87,13 @@ protected:
 
 QByteArray tagOf(const Http::Response& response)
 {
-    for (const Http::Field& field : response.headers) {
-        if (field.name == "ETag")
-            return field.value;
-    }
-    return {};
+    return headerOf(response, "ETag");
 }
 
 TEST_F(RenderTest, ShowsValuesByTheWindowThatIsAskedFor)
 {
-    const struct
-    {
-        const char* window;
-        int pixel;  // and its value
-        int level;
-    } cases[] = {
+    // The value of a pixel is its number.
+    const std::tuple<const char*, int, int> kLevels[] = {
         {"32,32,linear-exact", 16, 0},
         {"32,32,linear-exact", 32, 127},
         {"32,32,linear-exact", 48, 255},
@@ -117,18 +104,17 @@ TEST_F(RenderTest, ShowsValuesByTheWindowThatIsAskedFor)
         {"32,16,sigmoid", 28, 68},
         {"1000,10,linear", 63, 0},
     };
-    for (const auto& each : cases) {
-        const QImage shown = picture("frames/1/rendered", {{"window", each.window}});
-        EXPECT_NEAR(qRed(shown.pixel(each.pixel % kSide, each.pixel / kSide)), each.level, 1)
-            << each.window << " of " << each.pixel;
+    for (const auto& [window, pixel, level] : kLevels) {
+        const QImage shown = picture("frames/1/rendered", {{"window", window}});
+        EXPECT_NEAR(qRed(shown.pixel(pixel % kSide, pixel / kSide)), level, 1) << window << " of " << pixel;
     }
 }
 
 TEST_F(RenderTest, FollowsACorrectedWindow)
 {
-    store(aGreyImage().with(DCM_WindowCenter, "32").with(DCM_WindowWidth, "32"));
+    store(aGreyImage().with("WindowCenter=32|WindowWidth=32"));
     const int before = qRed(picture("frames/1/rendered").pixel(0, 4));
-    store(aGreyImage().with(DCM_WindowCenter, "32").with(DCM_WindowWidth, "32"), "24");
+    store(aGreyImage().with("WindowCenter=32|WindowWidth=32"), "24");
     EXPECT_GT(qRed(picture("frames/1/rendered").pixel(0, 4)), before + 50);
 }
 
@@ -139,12 +125,9 @@ TEST_F(RenderTest, GivesTheFramesThatAreAskedFor)
     const int last = qRed(picture("frames/3/rendered", window).pixel(0, 0));
     EXPECT_NEAR(last - first, 170, 2);
 
-    Http::Response parts = ask("rendered", window, "multipart/related; type=image/png");
+    const Http::Response parts = ask("rendered", window, "multipart/related; type=image/png");
     ASSERT_EQ(parts.status, 200);
-    QByteArray all;
-    for (QByteArray block(1, ' '); !block.isEmpty(); all += block)
-        ASSERT_TRUE(std::get<std::unique_ptr<Http::Producer>>(parts.body.front())->next(block).good());
-    EXPECT_EQ(all.count("Content-Type: image/png"), kFrames);
+    EXPECT_EQ(bodyOf(parts).count("Content-Type: image/png"), kFrames);
 }
 
 TEST_F(RenderTest, CutsTurnsAndFitsIntoTheViewport)
@@ -160,13 +143,7 @@ TEST_F(RenderTest, CutsTurnsAndFitsIntoTheViewport)
 
 TEST_F(RenderTest, RefusesWithTheRightStatus)
 {
-    const struct
-    {
-        const char* what;
-        Http::Field query;
-        const char* accept;
-        int status;
-    } cases[] = {
+    const std::tuple<const char*, Http::Field, const char*, int> kRefusals[] = {
         {"frames/4/rendered", {}, "image/png", 404},
         {"frames/0/rendered", {}, "image/png", 400},
         {"frames/1,2/rendered", {}, "image/png", 406},
@@ -181,29 +158,27 @@ TEST_F(RenderTest, RefusesWithTheRightStatus)
         {"thumbnail", {}, "image/png", 406},
         {"studies/1.3/rendered", {}, "image/png", 404},
     };
-    for (const auto& each : cases)
-        EXPECT_EQ(ask(each.what, {each.query}, each.accept).status, each.status)
-            << each.what << " " << each.query.value.constData();
+    for (const auto& [what, query, accept, status] : kRefusals)
+        EXPECT_EQ(ask(what, {query}, accept).status, status) << what << ' ' << query.value.constData();
 }
 
 TEST_F(RenderTest, MakesThumbnailsOfWhatIsStoredWhereThatDoes)
 {
-    EXPECT_EQ(QImage::fromData(body(ask("thumbnail", {}, "*/*"))).size(), QSize(256, 256));
+    EXPECT_EQ(QImage::fromData(bodyOf(ask("thumbnail", {}, "*/*"))).size(), QSize(256, 256));
 
     QImage stored(64, 32, QImage::Format_RGB32);
     stored.fill(Qt::darkGreen);
     QByteArray preview;
     QBuffer buffer(&preview);
-    buffer.open(QIODevice::WriteOnly);
     stored.save(&buffer, "JPEG");
     store(aGreyImage(), nullptr, preview);
     for (const char* level : {"studies/1.2/thumbnail", "studies/1.2/series/1.3/thumbnail",
                               "studies/1.2/series/1.3/instances/1.4/thumbnail"})
-        EXPECT_EQ(body(ask(level, {}, "image/jpeg")), preview) << level;
-    EXPECT_EQ(body(ask("thumbnail", {{"viewport", "256,256"}}, "image/*")), preview);
-    EXPECT_EQ(QImage::fromData(body(ask("thumbnail", {{"viewport", "32,32"}}, "image/jpeg"))).size(),
+        EXPECT_EQ(bodyOf(ask(level, {}, "image/jpeg")), preview) << level;
+    EXPECT_EQ(bodyOf(ask("thumbnail", {{"viewport", "256,256"}}, "image/*")), preview);
+    EXPECT_EQ(QImage::fromData(bodyOf(ask("thumbnail", {{"viewport", "32,32"}}, "image/jpeg"))).size(),
               QSize(32, 16));
-    EXPECT_EQ(QImage::fromData(body(ask("frames/2/thumbnail", {}, "image/jpeg"))).size(), QSize(256, 256));
+    EXPECT_EQ(QImage::fromData(bodyOf(ask("frames/2/thumbnail", {}, "image/jpeg"))).size(), QSize(256, 256));
 }
 
 TEST_F(RenderTest, TellsThatAPictureIsTheSameAsLongAsItIs)
@@ -234,23 +209,20 @@ TEST_F(RenderTest, TellsThatAPictureIsTheSameAsLongAsItIs)
 TEST_F(RenderTest, ShowsADocumentAsItIs)
 {
     const QByteArray document = QByteArray("%PDF-") + QByteArray(4995, 'x');
-    DatasetBuilder image = anImage("1.4").inStudy("1.2").inSeries("1.3");
+    DatasetBuilder image = anImage("1.4").inSeries("1.3");
     image.with(DCM_MIMETypeOfEncapsulatedDocument, "application/pdf");
     store(image.data(DCM_EncapsulatedDocument, document));
     for (const char* accept : {"*/*", "application/pdf", "image/webp,application/pdf;q=0.5"}) {
-        Http::Response shown = ask("rendered", {}, accept);
+        const Http::Response shown = ask("rendered", {}, accept);
         ASSERT_EQ(shown.status, 200) << accept;
-        EXPECT_EQ(shown.headers.first().value, "application/pdf");
-        QByteArray bytes;
-        const auto& range = std::get<Http::FileRange>(shown.body.front());
-        ASSERT_TRUE(range.file->read(range.offset, range.length, bytes).good());
-        EXPECT_EQ(bytes, document);
+        EXPECT_EQ(headerOf(shown, "Content-Type"), "application/pdf");
+        EXPECT_TRUE(std::holds_alternative<Http::FileRange>(shown.body.front()));
+        EXPECT_EQ(bodyOf(shown), document);
     }
     EXPECT_EQ(ask("rendered", {}, "image/jpeg").status, 406);
     mHeld = tagOf(ask("rendered", {}, "*/*"));
     EXPECT_EQ(ask("rendered", {}, "*/*").status, 304);
-    store(
-        anImage("1.4").inStudy("1.2").inSeries("1.3").with(DCM_MIMETypeOfEncapsulatedDocument, "text/html"));
+    store(anImage("1.4").inSeries("1.3").with(DCM_MIMETypeOfEncapsulatedDocument, "text/html"));
     EXPECT_EQ(ask("rendered", {}, "*/*").status, 404) << "nothing that a browser would run";
 }
 
@@ -264,29 +236,28 @@ DatasetBuilder aLine(const char* type, const char* name)
 TEST_F(RenderTest, TellsWhatAReportSaysAndNothingAsMarkup)
 {
     const QByteArray hostile = "<script>alert(1)</script> & \"quoted\"\r\nM\xfcller";
-    DatasetBuilder number = aLine("NUM", "Diameter");
-    number.withItem(DCM_MeasuredValueSequence,
-                    anItem()
-                        .with(DCM_NumericValue, "12.5")
-                        .withItem(DCM_MeasurementUnitsCodeSequence, anItem().with(DCM_CodeValue, "mm")));
+    const DatasetBuilder unit = anItem().with(DCM_CodeValue, "mm");
+    const DatasetBuilder measured =
+        anItem().with(DCM_NumericValue, "12.5").withItem(DCM_MeasurementUnitsCodeSequence, unit);
+    const DatasetBuilder number = aLine("NUM", "Diameter").withItem(DCM_MeasuredValueSequence, measured);
     DatasetBuilder inner = aLine("CONTAINER", "Findings").withItem(DCM_ContentSequence, number);
     inner.withItem(DCM_ContentSequence, aLine("TEXT", "Text").with(DCM_TextValue, hostile));
     inner.withItem(DCM_ContentSequence, aLine("TEXT", "Long").withLong(DCM_TextValue, 5000));
-    DatasetBuilder report = anImage("1.4").inStudy("1.2").inSeries("1.3").with(DCM_ValueType, "CONTAINER");
-    report.with(DCM_SpecificCharacterSet, "ISO_IR 100").with(DCM_VerificationFlag, "UNVERIFIED");
+    DatasetBuilder report = anImage("1.4").inSeries("1.3").with(DCM_ValueType, "CONTAINER");
+    report.with("SpecificCharacterSet=ISO_IR 100|VerificationFlag=UNVERIFIED");
     store(report.withItem(DCM_ContentSequence, inner));
 
-    const QByteArray text = body(ask("rendered", {}, "text/plain"));
+    const QByteArray text = bodyOf(ask("rendered", {}, "text/plain"));
     EXPECT_TRUE(text.contains("Verification: UNVERIFIED\n")) << text.constData();
     EXPECT_TRUE(text.contains("\n  Findings\n    Diameter: 12.5 mm\n    Text: <script>")) << text.constData();
     EXPECT_TRUE(text.contains("\n    M\xc3\xbcller\n"));
     EXPECT_TRUE(text.contains("    Long: " + QByteArray(5000, 'x')));
     const Http::Response page = ask("rendered", {}, "*/*");
-    EXPECT_EQ(page.headers.first().value, "text/html; charset=utf-8");
-    EXPECT_FALSE(body(page).contains("<script"));
-    EXPECT_TRUE(body(page).contains(
+    EXPECT_EQ(headerOf(page, "Content-Type"), "text/html; charset=utf-8");
+    EXPECT_FALSE(bodyOf(page).contains("<script"));
+    EXPECT_TRUE(bodyOf(page).contains(
         "<b>Text: </b>&lt;script&gt;alert(1)&lt;/script&gt; &amp; &quot;quoted&quot;<br>"));
-    EXPECT_EQ(body(page).count("<ul>"), body(page).count("</ul>"));
+    EXPECT_EQ(bodyOf(page).count("<ul>"), bodyOf(page).count("</ul>"));
     EXPECT_EQ(ask("rendered", {}, "image/jpeg").status, 406);
     mHeld = tagOf(page);
     EXPECT_EQ(ask("rendered", {}, "*/*").status, 304);

@@ -26,19 +26,12 @@ TEST(MediaTypes, AreToldOfEverySyntaxByItsOwnName)
 }
 
 /// What a client takes, what is stored, and what it gets: "1" is a single part, "D" decoded; empty: nothing.
-struct Row
-{
-    const char* accept;
-    const char* stored;
-    const char* given;
-};
-
 constexpr const char* kJpeg = "1.2.840.10008.1.2.4.50";
 constexpr const char* kJls = "1.2.840.10008.1.2.4.80";
 constexpr const char* kVideo = "1.2.840.10008.1.2.4.102";
 constexpr const char* kNative = "1.2.840.10008.1.2.1";
 
-const Row kRows[] = {
+const std::tuple<const char*, const char*, const char*> kRows[] = {
     {"", kJpeg, "image/jpeg"},
     {"*/*", kJpeg, "image/jpeg"},
     {"*/*", kNative, "application/octet-stream"},
@@ -103,18 +96,18 @@ QVector<QByteArray> encodingsOf(const QByteArray& stored)
 
 TEST(MediaTypes, OfPixelsAreWhatTheClientLikesBest)
 {
-    for (const Row& row : kRows) {
-        const QByteArray accept = *row.accept == '\0' ? QByteArray("*/*") : QByteArray(row.accept);
+    for (const auto& [header, stored, expected] : kRows) {
+        const QByteArray accept = *header == '\0' ? QByteArray("*/*") : QByteArray(header);
         PixelForm form;
         QByteArray given;
-        const PixelOffer offer{row.stored, row.stored != kVideo, true, false, encodingsOf(row.stored)};
+        const PixelOffer offer{stored, stored != kVideo, true, false, encodingsOf(stored)};
         if (choosePixelForm(Http::AcceptHeader(accept), offer, form)) {
             const bool isEncoded = !form.isStored && form.transferSyntax != kExplicitLittleEndian;
             const char* const kind = form.isStored ? "" : isEncoded ? "E " : "D ";
             given = QByteArray(form.isSinglePart ? "1 " : "") + kind +
                     (isEncoded ? form.contentType() : form.mediaType);
         }
-        EXPECT_EQ(given, row.given) << row.accept << " of " << row.stored;
+        EXPECT_EQ(given, expected) << header << " of " << stored;
     }
 }
 
@@ -129,7 +122,7 @@ TEST(MediaTypes, OfEverySyntaxHaveOneUsualOne)
 }
 
 /// What a client takes, and of an object stored as JPEG: how it is packed and in which syntax; empty: not at all.
-const Row kInstanceRows[] = {
+const std::tuple<const char*, const char*, const char*> kInstanceRows[] = {
     {"*/*", "", "multipart 1.2.840.10008.1.2.1"},
     {"multipart/related", "", "multipart 1.2.840.10008.1.2.1"},
     {"multipart/related; type=\"application/dicom\"", "", "multipart 1.2.840.10008.1.2.1"},
@@ -159,13 +152,13 @@ const QVector<QByteArray> kGivable = {
 
 TEST(MediaTypes, OfInstancesAreWhatTheClientLikesBest)
 {
-    for (const Row& row : kInstanceRows) {
+    for (const auto& [header, stored, expected] : kInstanceRows) {
         InstanceForm form;
         QByteArray given;
         const char* const names[] = {"multipart ", "single ", "zip "};
-        if (chooseInstanceForm(Http::AcceptHeader(row.accept), true, form))
+        if (chooseInstanceForm(Http::AcceptHeader(header), true, form))
             given = names[static_cast<int>(form.packing)] + form.syntaxFor(kJpeg, kGivable);
-        EXPECT_EQ(given, row.given) << row.accept;
+        EXPECT_EQ(given, expected) << header;
     }
     InstanceForm form;
     EXPECT_FALSE(chooseInstanceForm(Http::AcceptHeader("application/dicom"), false, form))

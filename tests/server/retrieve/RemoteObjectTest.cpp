@@ -9,8 +9,8 @@ using namespace Kdd::DicomWeb;
 namespace
 {
 
-const QByteArray kFrame = QByteArray(kInstance) + "/frames/2";
-const QByteArray kText = QByteArray(kInstance) + "/bulkdata/0040A160";
+const QByteArray kFrame = kInstance + "/frames/2";
+const QByteArray kText = kInstance + "/bulkdata/0040A160";
 
 class RemoteObjectTest : public RetrieveTest
 {
@@ -31,8 +31,7 @@ protected:
     QVector<int> statuses()
     {
         QVector<int> all;
-        for (const QByteArray& path :
-             {QByteArray(kInstance), kFrame, kText, QByteArray(kInstance) + "/rendered"})
+        for (const QByteArray& path : {kInstance, kFrame, kText, kInstance + "/rendered"})
             all.append(get(path).status);
         return all;
     }
@@ -46,17 +45,12 @@ TEST_F(RemoteObjectTest, IsGivenByEveryResourceWithCorrections)
     serve();
     correct(DCM_PatientName, "Right^Name");
     for (const char* accept : {kStored, "application/dicom; transfer-syntax=1.2.840.10008.1.2.4.80"}) {
-        Http::Response instance = get(kInstance, accept);
-        EXPECT_EQ(nameIn(bodyOf(instance)), "Right^Name") << accept;
+        EXPECT_EQ(nameIn(bodyOf(get(kInstance, accept))), "Right^Name") << accept;
     }
-    Http::Response frame = get(kFrame, "application/octet-stream");
-    EXPECT_EQ(bodyOf(frame), frameOf(1));
-    Http::Response text = get(kText);
-    EXPECT_EQ(bodyOf(text), QByteArray(3000, 'x'));
-    Http::Response part = get(kText, "*/*", "bytes=10-12");
-    EXPECT_EQ(bodyOf(part), "xxx");
-    Http::Response shown = get(kFrame + "/rendered", "image/png");
-    EXPECT_EQ(QImage::fromData(bodyOf(shown)).size(), QSize(16, 16));
+    EXPECT_EQ(bodyOf(get(kFrame, "application/octet-stream")), frameOf(1));
+    EXPECT_EQ(bodyOf(get(kText)), QByteArray(3000, 'x'));
+    EXPECT_EQ(bodyOf(get(kText, "*/*", "bytes=10-12")), "xxx");
+    EXPECT_EQ(QImage::fromData(bodyOf(get(kFrame + "/rendered", "image/png"))).size(), QSize(16, 16));
 }
 
 TEST_F(RemoteObjectTest, IsRefusedWhenTheServerDoesNotGiveIt)

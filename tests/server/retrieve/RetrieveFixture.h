@@ -1,5 +1,6 @@
 #pragma once
 
+#include "server/Handled.h"
 #include "server/dicomweb/render/RenderedResource.h"
 #include "server/dicomweb/retrieve/BulkDataResource.h"
 #include "server/dicomweb/retrieve/FramesResource.h"
@@ -26,8 +27,8 @@
 namespace Kdd::DicomWeb
 {
 
-constexpr const char* kInstance = "studies/1.2/series/1.2.3/instances/1.2.3.1";
-constexpr const char* kObject = "requestType=WADO&studyUID=1.2&seriesUID=1.2.3&objectUID=1.2.3.1&";
+const QByteArray kInstance = "studies/1.2/series/1.2.3/instances/1.2.3.1";
+const QByteArray kObject = "requestType=WADO&studyUID=1.2&seriesUID=1.2.3&objectUID=1.2.3.1&";
 constexpr const char* kStored = "application/dicom; transfer-syntax=*";
 constexpr int kFrameBytes = 16 * 16 * 2;
 
@@ -111,19 +112,19 @@ protected:
         EXPECT_EQ(job.outcome.changed, 1);
     }
 
-    Http::Response get(const QByteArray& path, const QByteArray& accept = "*/*", const QByteArray& range = {})
+    Http::Response get(const QByteArray& target, const QByteArray& accept = "*/*",
+                       const QByteArray& range = {})
     {
-        Http::Request request;
-        request.headers = {{"accept", accept}};
+        Http::Request request = requestFor(target, {{"accept", accept}});
         if (!range.isEmpty())
             request.headers.append({"range", range});
-        return get(path, request);
+        return get(request);
     }
 
-    Http::Response get(const QByteArray& path, const Http::Request& request)
+    Http::Response get(const Http::Request& request)
     {
         ResourcePath parsed;
-        if (!ResourcePath::parse(path.split('/').toVector(), parsed))
+        if (!ResourcePath::parse(request.path, parsed))
             return Http::failure(404, QStringLiteral("no path"));
         for (const auto& resource : mResources) {
             if (resource->owns(parsed))
@@ -135,54 +136,17 @@ protected:
     /// As older viewers ask, all in parameters.
     Http::Response getByUri(const QByteArray& parameters, const QByteArray& accept = "*/*")
     {
-        Http::Request request;
-        request.headers = {{"accept", accept}};
-        for (const QByteArray& pair : parameters.split('&')) {
-            if (!pair.isEmpty())
-                request.query.append({pair.left(pair.indexOf('=')), pair.mid(pair.indexOf('=') + 1)});
-        }
-        return get("wado", request);
-    }
-
-    static QByteArray bodyOf(Http::Response& response)
-    {
-        QByteArray body;
-        QByteArray block;
-        for (Http::BodyPart& part : response.body) {
-            if (const auto* bytes = std::get_if<QByteArray>(&part)) {
-                body += *bytes;
-            } else if (const auto* range = std::get_if<Http::FileRange>(&part)) {
-                EXPECT_TRUE(range->file->read(range->offset, range->length, block).good());
-                body += block;
-            } else {
-                auto& producer = *std::get<std::unique_ptr<Http::Producer>>(part);
-                do {
-                    const Result produced = producer.next(block);
-                    if (produced.bad())
-                        return "broken off";
-                    body += block;
-                } while (!block.isEmpty());
-            }
-        }
-        return body;
-    }
-
-    static QByteArray header(const Http::Response& response, const char* name)
-    {
-        for (const Http::Field& field : response.headers) {
-            if (field.name == name)
-                return field.value;
-        }
-        return {};
+        return get("wado?" + parameters, accept);
     }
 
     /// The parts of a multipart answer: header lines and body.
-    static QVector<std::pair<QByteArray, QByteArray>> partsOf(Http::Response& response)
+    using Parts = QVector<std::pair<QByteArray, QByteArray>>;
+    static Parts partsOf(const Http::Response& response)
     {
-        const QByteArray type = header(response, "Content-Type");
+        const QByteArray type = headerOf(response, "Content-Type");
         const QByteArray mark = "--" + type.mid(type.indexOf("boundary=") + 9);
-        QByteArray body = bodyOf(response);
-        QVector<std::pair<QByteArray, QByteArray>> parts;
+        const QByteArray body = bodyOf(response);
+        Parts parts;
         for (int at = body.indexOf(mark + "\r\n"); at >= 0;) {
             const int next = body.indexOf(mark, at + 1);
             const int head = body.indexOf("\r\n\r\n", at);

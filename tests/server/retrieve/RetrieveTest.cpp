@@ -9,25 +9,14 @@ namespace
 TEST_F(RetrieveTest, GivesFramesInTheOrderAskedFor)
 {
     add("a.dcm", anImageWithFrames(3));
-    Http::Response response = get(QByteArray(kInstance) + "/frames/3,1,3");
+    Http::Response response = get(kInstance + "/frames/3,1,3");
     EXPECT_TRUE(std::holds_alternative<Http::FileRange>(response.body.at(1))) << "left in the file";
-    const auto parts = partsOf(response);
-    ASSERT_EQ(parts.size(), 3);
-    EXPECT_EQ(parts[0].second, frameOf(2));
-    EXPECT_EQ(parts[1].second, frameOf(0));
-    EXPECT_EQ(parts[2].second, frameOf(2));
-    EXPECT_EQ(parts[0].first, "Content-Type: application/octet-stream; transfer-syntax=1.2.840.10008.1.2.1");
+    const QByteArray head = "Content-Type: application/octet-stream; transfer-syntax=1.2.840.10008.1.2.1";
+    EXPECT_EQ(partsOf(response), (Parts{{head, frameOf(2)}, {head, frameOf(0)}, {head, frameOf(2)}}));
 }
 
 /// A path below the instance, what the client takes, and the status.
-struct Refusal
-{
-    const char* path;
-    const char* accept;
-    int status;
-};
-
-const Refusal kRefusals[] = {
+const std::tuple<const char*, const char*, int> kRefusals[] = {
     {"/frames/0", "*/*", 404},
     {"/frames/3", "*/*", 404},
     {"/frames/99999999999", "*/*", 400},
@@ -50,9 +39,9 @@ const Refusal kRefusals[] = {
 TEST_F(RetrieveTest, RefusesWhatIsNotThereOrCannotBeGiven)
 {
     add("a.dcm", anImageWithFrames(2));
-    for (const Refusal& row : kRefusals)
-        EXPECT_EQ(get(QByteArray(kInstance) + row.path, row.accept).status, row.status) << row.path;
-    const QByteArray most = kInstance + QByteArray("/frames/1") + QByteArray(",1").repeated(9999);
+    for (const auto& [path, accept, status] : kRefusals)
+        EXPECT_EQ(get(kInstance + path, accept).status, status) << path;
+    const QByteArray most = kInstance + "/frames/1" + QByteArray(",1").repeated(9999);
     EXPECT_EQ(get(most, "*/*").status, 200);
     EXPECT_EQ(get(most + ",1", "*/*").status, 400);
     EXPECT_EQ(get("studies/1.9").status, 404);
@@ -63,17 +52,14 @@ TEST_F(RetrieveTest, RefusesWhatIsNotThereOrCannotBeGiven)
 TEST_F(RetrieveTest, ShowsCorrectionsByEveryResource)
 {
     add("a.dcm", anImageWithFrames(2));
-    EXPECT_EQ(bodyOf(*std::make_unique<Http::Response>(get(kInstance, kStored))), fileContent(path("a.dcm")));
+    EXPECT_EQ(bodyOf(get(kInstance, kStored)), fileContent(path("a.dcm")));
     correct(DCM_PatientName, "Right^Name");
     for (const char* accept :
          {"application/dicom", kStored, "application/dicom; transfer-syntax=1.2.840.10008.1.2"}) {
-        Http::Response instance = get(kInstance, accept);
-        EXPECT_EQ(nameIn(bodyOf(instance)), "Right^Name") << accept;
+        EXPECT_EQ(nameIn(bodyOf(get(kInstance, accept))), "Right^Name") << accept;
     }
-    Http::Response name = get(QByteArray(kInstance) + "/bulkdata/00100010");
-    EXPECT_EQ(bodyOf(name), "Right^Name");
-    Http::Response frame = get(QByteArray(kInstance) + "/frames/1", "application/octet-stream");
-    EXPECT_EQ(bodyOf(frame), frameOf(0));
+    EXPECT_EQ(bodyOf(get(kInstance + "/bulkdata/00100010")), "Right^Name");
+    EXPECT_EQ(bodyOf(get(kInstance + "/frames/1", "application/octet-stream")), frameOf(0));
 }
 
 TEST_F(RetrieveTest, FindsMovedAndRenamedImagesWhereTheyAreNow)
@@ -82,20 +68,18 @@ TEST_F(RetrieveTest, FindsMovedAndRenamedImagesWhereTheyAreNow)
     add("b.dcm", anImageWithFrames(1, "1.7.1").inStudy("1.7").inSeries("1.7.7"));
     correct(DCM_SOPInstanceUID, "1.2.3.9", "1.2", "1.7");
     const QByteArray moved = "studies/1.7/series/1.2.3/instances/1.2.3.9";
-    Http::Response frame = get(moved + "/frames/1", "application/octet-stream");
-    EXPECT_EQ(bodyOf(frame), frameOf(0));
-    Http::Response instance = get(moved, kStored);
-    const QByteArray dicom = bodyOf(instance);
+    EXPECT_EQ(bodyOf(get(moved + "/frames/1", "application/octet-stream")), frameOf(0));
+    const QByteArray dicom = bodyOf(get(moved, kStored));
     EXPECT_EQ(nameIn(dicom, DCM_SOPInstanceUID), "1.2.3.9");
     EXPECT_EQ(nameIn(dicom, DCM_StudyInstanceUID), "1.7");
-    EXPECT_EQ(get(QByteArray(kInstance) + "/frames/1").status, 404);
+    EXPECT_EQ(get(kInstance + "/frames/1").status, 404);
     EXPECT_EQ(get("studies/1.7/series/1.2.3/instances/1.2.3.1").status, 404);
     const QByteArray byUri = QByteArray(kObject).replace("1.2&", "1.7&").replace("1.2.3.1", "1.2.3.9");
-    Http::Response object = getByUri(byUri + "contentType=application/dicom");
-    EXPECT_EQ(nameIn(bodyOf(object), DCM_SOPInstanceUID), "1.2.3.9");
+    EXPECT_EQ(nameIn(bodyOf(getByUri(byUri + "contentType=application/dicom")), DCM_SOPInstanceUID),
+              "1.2.3.9");
     EXPECT_EQ(getByUri(byUri + "contentType=image/jpeg").status, 200);
     for (const char* form : {"contentType=application/dicom", "contentType=image/jpeg"})
-        EXPECT_EQ(getByUri(QByteArray(kObject) + form).status, 404) << form;
+        EXPECT_EQ(getByUri(kObject + form).status, 404) << form;
 }
 
 TEST_F(RetrieveTest, NeverGivesAnotherImage)
@@ -104,10 +88,10 @@ TEST_F(RetrieveTest, NeverGivesAnotherImage)
     const auto statuses = [&] {
         QSet<int> all;
         for (const char* below : {"", "/frames/1", "/bulkdata/7FE00010", "/pixeldata", "/rendered"})
-            all.insert(get(QByteArray(kInstance) + below).status);
+            all.insert(get(kInstance + below).status);
         for (const char* form :
              {"application/dicom", "application/dicom&transferSyntax=1.2.840.10008.1.2.5", "image/jpeg"})
-            all.insert(getByUri(kObject + QByteArray("contentType=") + form).status);
+            all.insert(getByUri(kObject + "contentType=" + form).status);
         return all;
     };
     EXPECT_EQ(statuses(), QSet<int>{200});
@@ -120,8 +104,7 @@ TEST_F(RetrieveTest, NeverGivesAnotherImage)
     EXPECT_EQ(statuses(), QSet<int>{500}) << "cut";
     QFile::remove(path("a.dcm"));
     EXPECT_EQ(statuses(), QSet<int>{410}) << "gone";
-    Http::Response gone = get(QByteArray(kInstance) + "/rendered");
-    EXPECT_FALSE(bodyOf(gone).contains("a.dcm"));
+    EXPECT_FALSE(bodyOf(get(kInstance + "/rendered")).contains("a.dcm"));
 }
 
 TEST_F(RetrieveTest, PacksStudiesAndLeavesOutWhatIsGone)
@@ -132,16 +115,13 @@ TEST_F(RetrieveTest, PacksStudiesAndLeavesOutWhatIsGone)
     Http::Response study = get("studies/1.2");
     EXPECT_EQ(study.status, 200);
     EXPECT_EQ(partsOf(study).size(), 3);
-    Http::Response series =
-        get("studies/1.2/series/1.2.3", "multipart/related; type=application/dicom; transfer-syntax=*");
-    const auto parts = partsOf(series);
+    const auto parts = partsOf(
+        get("studies/1.2/series/1.2.3", "multipart/related; type=application/dicom; transfer-syntax=*"));
     ASSERT_EQ(parts.size(), 2);
-    const QByteArray compressed = "Content-Type: application/dicom; transfer-syntax=1.2.840.10008.1.2.5";
-    const auto& second = parts[parts[1].first == compressed ? 1 : 0];
-    EXPECT_EQ(second.first, compressed);
-    EXPECT_EQ(second.second, fileContent(path("b.dcm")));
-    Http::Response zip = get("studies/1.2", "application/zip; transfer-syntax=*");
-    EXPECT_TRUE(bodyOf(zip).contains("1.2/1.2.4/1.2.3.3.dcm"));
+    EXPECT_TRUE(parts.contains({"Content-Type: application/dicom; transfer-syntax=1.2.840.10008.1.2.5",
+                                fileContent(path("b.dcm"))}));
+    EXPECT_TRUE(
+        bodyOf(get("studies/1.2", "application/zip; transfer-syntax=*")).contains("1.2/1.2.4/1.2.3.3.dcm"));
     QFile::remove(path("a.dcm"));
     Http::Response rest = get("studies/1.2");
     EXPECT_EQ(rest.status, 206);
@@ -155,20 +135,18 @@ TEST_F(RetrieveTest, GivesValuesThatWereLeftOutAndRangesOfThem)
     image.withItem(DCM_ContentSequence, anItem());
     image.withItem(DCM_ContentSequence, anItem().withLong(DCM_TextValue, 3000));
     add("a.dcm", image.data(DCM_EncapsulatedDocument, document));
-    const QByteArray value = QByteArray(kInstance) + "/bulkdata/00420011";
+    const QByteArray value = kInstance + "/bulkdata/00420011";
     Http::Response whole = get(value);
-    EXPECT_EQ(header(whole, "Content-Type"), "application/pdf");
+    EXPECT_EQ(headerOf(whole, "Content-Type"), "application/pdf");
     EXPECT_EQ(bodyOf(whole), document);
     Http::Response part = get(value, "application/octet-stream", "bytes=2-6");
     EXPECT_EQ(part.status, 206);
-    EXPECT_EQ(header(part, "Content-Range"), "bytes 2-6/5000");
+    EXPECT_EQ(headerOf(part, "Content-Range"), "bytes 2-6/5000");
     EXPECT_EQ(bodyOf(part), document.mid(2, 5));
     EXPECT_EQ(get(value, "*/*", "bytes=5000-").status, 416);
-    Http::Response nested = get(QByteArray(kInstance) + "/bulkdata/0040A730/1/0040A160");
-    EXPECT_EQ(bodyOf(nested), QByteArray(3000, 'x'));
-    EXPECT_EQ(get(QByteArray(kInstance) + "/bulkdata/0040A730/0/0040A160").status, 404);
-    Http::Response all = get("studies/1.2/bulkdata");
-    const auto parts = partsOf(all);
+    EXPECT_EQ(bodyOf(get(kInstance + "/bulkdata/0040A730/1/0040A160")), QByteArray(3000, 'x'));
+    EXPECT_EQ(get(kInstance + "/bulkdata/0040A730/0/0040A160").status, 404);
+    const auto parts = partsOf(get("studies/1.2/bulkdata"));
     ASSERT_EQ(parts.size(), 2);
     EXPECT_TRUE(parts[0].first.endsWith(
                     "Content-Location: series/1.2.3/instances/1.2.3.1/bulkdata/0040A730/1/0040A160") ||
@@ -198,8 +176,7 @@ TEST_F(RetrieveTest, GivesRealFramesAndObjects)
         const bool hasPixels = dicom.getDataset()->tagExists(DCM_PixelData) ||
                                dicom.getDataset()->tagExists(DCM_FloatPixelData) ||
                                dicom.getDataset()->tagExists(DCM_DoubleFloatPixelData);
-        Http::Response frame = get(path + "/frames/1");
-        EXPECT_EQ(frame.status, hasPixels ? 200 : 404) << qPrintable(file);
+        EXPECT_EQ(get(path + "/frames/1").status, hasPixels ? 200 : 404) << qPrintable(file);
         Http::Response instance = get(path, kStored);
         EXPECT_EQ(instance.status, 200) << qPrintable(file);
         EXPECT_EQ(nameIn(bodyOf(instance), DCM_SOPInstanceUID), QByteArray::fromStdString(sop))

@@ -1,7 +1,5 @@
 #include "server/retrieve/RetrieveFixture.h"
 
-#include <dcmtk/dcmdata/dcpixseq.h>
-#include <dcmtk/dcmdata/dcpxitem.h>
 #include <dcmtk/dcmjpeg/djdecode.h>
 #include <dcmtk/dcmjpls/djdecode.h>
 #include <kddlib/FrameIndex.h>
@@ -56,15 +54,15 @@ TEST_F(TransferSyntaxTest, IsTheOneThatIsAskedForWithAllPixelsAndCorrections)
     for (E_TransferSyntax stored : {EXS_LittleEndianExplicit, EXS_LittleEndianImplicit, EXS_BigEndianExplicit,
                                     EXS_DeflatedLittleEndianExplicit, EXS_RLELossless}) {
         add("a.dcm", anImageWithFrames(kFrames), stored);
-        Http::Response frame = get(QByteArray(kInstance) + "/frames/2", "application/octet-stream");
-        EXPECT_EQ(bodyOf(frame), frameOf(1)) << DcmXfer(stored).getXferName();
-        Http::Response whole = get(QByteArray(kInstance) + "/pixeldata", "application/octet-stream");
-        EXPECT_EQ(bodyOf(whole), mPixels) << DcmXfer(stored).getXferName();
+        EXPECT_EQ(bodyOf(get(kInstance + "/frames/2", "application/octet-stream")), frameOf(1))
+            << DcmXfer(stored).getXferName();
+        EXPECT_EQ(bodyOf(get(kInstance + "/pixeldata", "application/octet-stream")), mPixels)
+            << DcmXfer(stored).getXferName();
         correct(DCM_PatientName, "Right^Name");
         for (E_TransferSyntax wanted : kWritten) {
             Http::Response response = get(kInstance, asked(wanted));
             ASSERT_EQ(response.status, 200) << DcmXfer(wanted).getXferName();
-            EXPECT_EQ(header(response, "Content-Type"), asked(wanted));
+            EXPECT_EQ(headerOf(response, "Content-Type"), asked(wanted));
             const QByteArray dicom = bodyOf(response);
             E_TransferSyntax given = EXS_Unknown;
             EXPECT_TRUE(pixelsIn(dicom, given) == mPixels)
@@ -82,9 +80,8 @@ TEST_F(TransferSyntaxTest, OfFramesIsThatOfTheObject)
 {
     add("a.dcm", anImageWithFrames(kFrames));
     for (const char* type : {"image/jpeg", "image/jls", "image/dicom-rle"}) {
-        Http::Response several =
-            get(QByteArray(kInstance) + "/frames/3,1", QByteArray("multipart/related; type=") + type);
-        const auto parts = partsOf(several);
+        const auto parts =
+            partsOf(get(kInstance + "/frames/3,1", QByteArray("multipart/related; type=") + type));
         ASSERT_EQ(parts.size(), 2) << type;
         const QByteArray said = parts[0].first.mid(int(qstrlen("Content-Type: ")));
         EXPECT_TRUE(said.startsWith(QByteArray(type) + "; transfer-syntax=")) << said.constData();
@@ -95,8 +92,8 @@ TEST_F(TransferSyntaxTest, OfFramesIsThatOfTheObject)
         ASSERT_TRUE(index.read(object).good()) << type;
         ASSERT_TRUE(index.readStored(object, 2, frame).good());
         EXPECT_EQ(parts[0].second, frame) << type;
-        Http::Response alone = get(QByteArray(kInstance) + "/frames/3", type);
-        EXPECT_EQ(header(alone, "Content-Type"), said);
+        Http::Response alone = get(kInstance + "/frames/3", type);
+        EXPECT_EQ(headerOf(alone, "Content-Type"), said);
         EXPECT_EQ(bodyOf(alone), frame) << type;
     }
 }
@@ -128,8 +125,8 @@ TEST_F(TransferSyntaxTest, OfDamagedPixelsIsGivenAsStoredOnly)
         EXPECT_EQ(bodyOf(response) == "broken off", !isKept) << DcmXfer(wanted).getXferName();
     }
     for (const char* type : {"application/octet-stream", "image/jls", "image/jpeg"}) {
-        EXPECT_EQ(get(QByteArray(kInstance) + "/frames/3", type).status, 500) << type;
-        EXPECT_EQ(get(QByteArray(kInstance) + "/frames/2", type).status, 200) << type;
+        EXPECT_EQ(get(kInstance + "/frames/3", type).status, 500) << type;
+        EXPECT_EQ(get(kInstance + "/frames/2", type).status, 200) << type;
     }
 }
 
@@ -139,21 +136,6 @@ QByteArray fragmentOf(int frame, int number)
     QByteArray bytes = "frame " + QByteArray::number(frame) + " fragment " + QByteArray::number(number);
     bytes.append(frame % 7, '.');
     return bytes.append(bytes.size() % 2, '.');
-}
-
-/// Compressed pixels; the first part is the table of offsets.
-DcmPixelData* encapsulated(const QVector<QByteArray>& parts, E_TransferSyntax syntax)
-{
-    auto sequence = std::make_unique<DcmPixelSequence>(DcmTag(DCM_PixelData, EVR_OB));
-    for (const QByteArray& part : parts) {
-        auto* item = new DcmPixelItem(DcmTag(DCM_Item, EVR_OB));
-        item->putUint8Array(reinterpret_cast<const Uint8*>(part.constData()),
-                            static_cast<Uint32>(part.size()));
-        sequence->insert(item);
-    }
-    auto* element = new DcmPixelData(DcmTag(DCM_PixelData, EVR_OB));
-    element->putOriginalRepresentation(syntax, nullptr, sequence.release());
-    return element;
 }
 
 enum class Table { None, Basic, Extended };
@@ -180,7 +162,7 @@ DatasetBuilder aLongImage(int frames, Table table)
         EXPECT_TRUE(extended->putUint64Array(wide.data(), wide.size()).good());
         image.with(extended);
     }
-    return image.with(encapsulated(parts, EXS_RLELossless));
+    return image.fragments(EXS_RLELossless, parts);
 }
 
 TEST_F(TransferSyntaxTest, FindsFramesByEitherTableOfOffsets)
@@ -189,13 +171,13 @@ TEST_F(TransferSyntaxTest, FindsFramesByEitherTableOfOffsets)
     for (Table table : {Table::Basic, Table::Extended, Table::None}) {
         add("a.dcm", aLongImage(kMany, table), EXS_RLELossless);
         for (int frame : {0, 1, 249, 498, 499}) {
-            Http::Response response =
-                get(QByteArray(kInstance) + "/frames/" + QByteArray::number(frame + 1), "image/dicom-rle");
+            const Http::Response response =
+                get(kInstance + "/frames/" + QByteArray::number(frame + 1), "image/dicom-rle");
             const QByteArray expected = fragmentOf(frame, 0) + fragmentOf(frame, 1);
             EXPECT_EQ(response.status, table == Table::None ? 500 : 200);
             EXPECT_TRUE(table == Table::None || bodyOf(response) == expected) << frame;
         }
-        EXPECT_EQ(get(QByteArray(kInstance) + "/frames/501", "image/dicom-rle").status, 404);
+        EXPECT_EQ(get(kInstance + "/frames/501", "image/dicom-rle").status, 404);
         QFile::remove(mStore.filePath("a.dcm"));
     }
 }
@@ -204,30 +186,28 @@ TEST_F(TransferSyntaxTest, OfVideosIsTheStoredOne)
 {
     const QByteArray stream = QByteArray("\0\0\0\x18", 4) + "ftypmp42" + QByteArray(1000, 'v');
     DatasetBuilder image = anImageWithFrames(30);
-    image.with(encapsulated({{}, stream.left(500), stream.mid(500)}, EXS_MPEG4HighProfileLevel4_1));
+    image.fragments(EXS_MPEG4HighProfileLevel4_1, {"", stream.left(500), stream.mid(500)});
     add("a.dcm", image, EXS_MPEG4HighProfileLevel4_1);
-    const QByteArray instance = kInstance;
     for (const char* accept : {"video/mp4", "video/*", "application/octet-stream; transfer-syntax=*"}) {
-        Http::Response frame = get(instance + "/frames/1", accept);
-        EXPECT_EQ(header(frame, "Content-Type"), "video/mp4; transfer-syntax=1.2.840.10008.1.2.4.102")
+        Http::Response frame = get(kInstance + "/frames/1", accept);
+        EXPECT_EQ(headerOf(frame, "Content-Type"), "video/mp4; transfer-syntax=1.2.840.10008.1.2.4.102")
             << accept;
         EXPECT_EQ(bodyOf(frame), stream);
     }
-    EXPECT_EQ(get(instance + "/frames/2").status, 404);
-    EXPECT_EQ(get(instance + "/frames/1", "image/jpeg").status, 406);
-    EXPECT_EQ(get(instance + "/frames/1", "application/octet-stream").status, 406);
-    EXPECT_EQ(get(instance, "application/dicom").status, 406);
-    EXPECT_EQ(get(instance, kStored).status, 200);
-    Http::Response shown = get(instance + "/rendered", "video/mp4");
-    EXPECT_EQ(header(shown, "Content-Type"), "video/mp4");
+    EXPECT_EQ(get(kInstance + "/frames/2").status, 404);
+    EXPECT_EQ(get(kInstance + "/frames/1", "image/jpeg").status, 406);
+    EXPECT_EQ(get(kInstance + "/frames/1", "application/octet-stream").status, 406);
+    EXPECT_EQ(get(kInstance, "application/dicom").status, 406);
+    EXPECT_EQ(get(kInstance, kStored).status, 200);
+    Http::Response shown = get(kInstance + "/rendered", "video/mp4");
+    EXPECT_EQ(headerOf(shown, "Content-Type"), "video/mp4");
     EXPECT_EQ(bodyOf(shown), stream);
-    Http::Response part = get(instance + "/rendered", "video/*", "bytes=498-501");
+    Http::Response part = get(kInstance + "/rendered", "video/*", "bytes=498-501");
     EXPECT_EQ(part.status, 206);
     EXPECT_EQ(bodyOf(part), stream.mid(498, 4));
-    EXPECT_EQ(get(instance + "/rendered", "video/mpeg").status, 406);
-    Http::Request known;
-    known.headers = {{"accept", "video/mp4"}, {"if-none-match", header(shown, "ETag")}};
-    EXPECT_EQ(get(instance + "/rendered", known).status, 304);
+    EXPECT_EQ(get(kInstance + "/rendered", "video/mpeg").status, 406);
+    const Headers known = {{"accept", "video/mp4"}, {"if-none-match", headerOf(shown, "ETag")}};
+    EXPECT_EQ(get(requestFor(kInstance + "/rendered", known)).status, 304);
 }
 
 }  // namespace

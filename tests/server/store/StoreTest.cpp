@@ -1,11 +1,11 @@
 #include "server/ServerFixture.h"
 #include "support/FileContent.h"
+#include "support/Json.h"
+#include "support/Threads.h"
 
 #include <kddlib/QAData.h>
 #include <kddlib/StudyChange.h>
 #include <kddlib/TagFile.h>
-
-#include <thread>
 
 using namespace Kdd;
 
@@ -36,32 +36,33 @@ protected:
         return post(partOf(image.file()) + "--cut--", path);
     }
 
+    /// Two servers over the one store, of which one stores an object and the other is asked.
+    void onTwoServers(const std::function<void(int number, const QByteArray& instance)>& ask)
+    {
+        start();
+        std::unique_ptr<Server> other = std::move(mServer);
+        start();
+        for (int i = 1; i <= 6; ++i) {
+            other.swap(mServer);
+            const QByteArray uid = "1.2.3." + QByteArray::number(i);
+            ASSERT_EQ(store(anImage(uid)).status, 200);
+            other.swap(mServer);
+            ask(i, "/dicom-web/studies/1.2/series/1.2.3/instances/" + uid);
+        }
+    }
+
     /// "1.2.3.1" for each that is stored, "1.2.3.1:0111" for one that is not, ":C000" for one without name.
     static std::string told(const Reply& reply)
     {
-        QStringList lines;
-        const QJsonObject report = QJsonDocument::fromJson(reply.body).object();
-        const auto add = [&](const char* sequence) {
-            const QJsonValue items =
-                report.value(QLatin1String(sequence)).toObject().value(QLatin1String("Value"));
-            for (const QJsonValue& item : items.toArray()) {
-                const auto first = [&](const char* key) {
-                    return item.toObject()
-                        .value(QLatin1String(key))
-                        .toObject()
-                        .value(QLatin1String("Value"))[0];
-                };
-                const int reason = first("00081197").toInt();
-                lines.append(first("00081155").toString() +
-                             (reason == 0
-                                  ? QString()
-                                  : QStringLiteral(":%1").arg(reason, 4, 16, QLatin1Char('0')).toUpper()));
+        QString line = QString::number(reply.status);
+        for (const char* sequence : {"00081199/Value", "00081198/Value", "0008119A/Value"}) {
+            for (const QJsonValue& item : jsonAt(reply.body, sequence).toArray()) {
+                line += QLatin1Char(' ') + jsonAt(item, "00081155/Value/0").toString();
+                if (const int reason = jsonAt(item, "00081197/Value/0").toInt(); reason != 0)
+                    line += QStringLiteral(":%1").arg(reason, 4, 16, QLatin1Char('0')).toUpper();
             }
-        };
-        for (const char* sequence : {"00081199", "00081198", "0008119A"})
-            add(sequence);
-        return (QString::number(reply.status) + QLatin1Char(' ') + lines.join(QLatin1Char(' ')))
-            .toStdString();
+        }
+        return line.toStdString();
     }
 };
 
@@ -88,56 +89,37 @@ TEST_F(StoreTest, WhatIsToldStoredIsFoundAndRetrievedAtOnce)
 
 TEST_F(StoreTest, WhatOneServerStoredAnotherOneFindsAtOnce)
 {
-    start();
-    std::unique_ptr<Server> other = std::move(mServer);
-    start();
-    for (int i = 1; i <= 6; ++i) {
-        other.swap(mServer);
-        const QByteArray uid = "1.2.3." + QByteArray::number(i);
-        ASSERT_EQ(store(anImage(uid)).status, 200);
-        other.swap(mServer);
-        const QByteArray image = "/studies/1.2/series/1.2.3/instances/" + uid;
+    onTwoServers([this](int number, const QByteArray& instance) {
         // Each way of asking, with nothing asked before that would have brought it in.
-        if (i % 3 == 0)
-            EXPECT_EQ(get(image).status, 200);
-        else if (i % 3 == 1)
-            EXPECT_EQ(get(image + "/metadata").status, 200);
+        if (number % 3 == 2)
+            EXPECT_EQ(instances("1.2"), number);
         else
-            EXPECT_EQ(instances("1.2"), i);
-    }
+            EXPECT_EQ(ask("GET", instance + (number % 3 == 0 ? "" : "/metadata")).status, 200);
+    });
 }
 
 TEST_F(StoreTest, ATagFileThatIsNoGoodIsMadeAnewWithWhatAnotherOneTook)
 {
-    const QString tagFile = TagFile::cacheFilePathForStudy("1.2");
-    start();
-    std::unique_ptr<Server> other = std::move(mServer);
-    start();
-    for (int i = 1; i <= 6; ++i) {
-        other.swap(mServer);
-        const QByteArray uid = "1.2.3." + QByteArray::number(i);
-        ASSERT_EQ(store(anImage(uid)).status, 200);
-        other.swap(mServer);
-        if (i % 2 == 0)
+    onTwoServers([this](int number, const QByteArray& instance) {
+        const QString tagFile = TagFile::cacheFilePathForStudy("1.2");
+        if (number % 2 == 0)
             QFile::remove(tagFile);
         else
             putFile(tagFile, "no tag file");
-        const QByteArray image = "/dicom-web/studies/1.2/series/1.2.3/instances/" + uid;
-        const QByteArray ways[] = {image, image + "/metadata", "/browser/studies/1.2"};
-        EXPECT_EQ(ask("GET", ways[i % 3]).status, 200) << ways[i % 3].constData();
-        EXPECT_EQ(instances("1.2"), i);
-    }
+        const QByteArray ways[] = {instance, instance + "/metadata", "/browser/studies/1.2"};
+        EXPECT_EQ(ask("GET", ways[number % 3]).status, 200) << ways[number % 3].constData();
+        EXPECT_EQ(instances("1.2"), number);
+    });
 }
 
 TEST_F(StoreTest, TellsNothingIncompleteOfAStudyThatAnotherOneWorksOn)
 {
-    Result result;
     std::unique_ptr<Kxg::StudyClaim> claim;
     start();
     ASSERT_EQ(store(anImage("1.2.3.1")).status, 200);
     ASSERT_EQ(instances("1.2"), 1);
-    const auto catalogue = Kxg::Catalogue::open(Kxg::DatabaseServer(), result);
-    ASSERT_TRUE(catalogue->claim("1.2", 5000, claim).good() && claim != nullptr);
+    const auto database = catalogue();
+    ASSERT_TRUE(database->claim("1.2", 5000, claim).good() && claim != nullptr);
     ASSERT_EQ(store(anImage("1.2.3.2")).status, 200);
     const Reply held = get("/studies/1.2/instances?SOPInstanceUID=1.2.3.2");
     EXPECT_EQ(held.status, 503);
@@ -177,14 +159,7 @@ TEST_F(StoreTest, TakesAnObjectOnceHoweverOftenItComes)
 {
     start();
     const QByteArray object = anImage("1.2.3.1").file();
-    std::vector<std::thread> senders;
-    std::vector<std::string> answers(8);
-    for (std::string& answer : answers)
-        senders.emplace_back([&] { answer = told(post(partOf(object) + "--cut--")); });
-    for (std::thread& sender : senders)
-        sender.join();
-    for (const std::string& answer : answers)
-        EXPECT_EQ(answer, "200 1.2.3.1");
+    onThreads(8, [&](int) { EXPECT_EQ(told(post(partOf(object) + "--cut--")), "200 1.2.3.1"); });
     // Another sender writes meta information of its own.
     QByteArray sentOn = object;
     sentOn[5] = 'x';
@@ -238,9 +213,7 @@ TEST_F(StoreTest, TakesBackWhatWasRemoved)
     start();
     store(anImage("1.2.3.1"));
     ASSERT_EQ(instances("1.2"), 1);
-    Result result;
-    const auto catalogue = Kxg::Catalogue::open(Kxg::DatabaseServer(), result);
-    ASSERT_TRUE(StudyChange(*catalogue).remove({"1.2", {}, {}}).good());
+    ASSERT_TRUE(StudyChange(*catalogue()).remove({"1.2", {}, {}}).good());
     EXPECT_EQ(instances("1.2"), 0);
     EXPECT_EQ(told(store(anImage("1.2.3.1").with(DCM_PatientName, "Other"))), "200 1.2.3.1");
     EXPECT_EQ(instances("1.2"), 1);
@@ -254,24 +227,30 @@ TEST_F(StoreTest, AnswersWhatItCannotTakeBeforeItComes)
     mSettings.objects->objectBytes = 50000;
     start();
     const QByteArray part = partOf(anImage("1.2.3.1").file());
-    EXPECT_EQ(post(part, "/studies", "multipart/form-data; boundary=cut").status, 415);
-    EXPECT_EQ(
-        post(part, "/studies", "multipart/related; type=\"application/dicom+json\"; boundary=cut").status,
-        415);
-    EXPECT_EQ(post(part, "/studies", "multipart/related; type=\"application/dicom\"").status, 400);
+    const QByteArray boundary(201, 'b');
+    const std::pair<QByteArray, int> kTypes[] = {
+        {"multipart/form-data; boundary=cut", 415},
+        {"multipart/related; type=\"application/dicom+json\"; boundary=cut", 415},
+        {"multipart/related; type=\"application/dicom\"", 400},
+        {"multipart/related; boundary=" + boundary, 400},
+    };
+    for (const auto& [type, status] : kTypes)
+        EXPECT_EQ(post(QByteArray(part).replace("cut", boundary), "/studies", type).status, status)
+            << type.constData();
     EXPECT_EQ(post(part, "/studies", kType, "Accept: text/html\r\n").status, 406);
     EXPECT_EQ(post(part, "/studies/1.2/series").status, 405);
-    EXPECT_EQ(post("nothing of it").status, 400);
-    const QByteArray boundary(201, 'b');
-    EXPECT_EQ(post("--" + boundary + "--", "/studies", "multipart/related; boundary=" + boundary).status,
-              400);
-    EXPECT_EQ(told(post(part + part.left(part.size() - 20))), "202 1.2.3.1 :C000") << "the end is missing";
-    EXPECT_EQ(told(post(part)), "400 :C000") << "nothing tells that it is whole";
-    EXPECT_EQ(told(post(partOf(QByteArray(60000, 'x')) + "--cut--")), "409 :A700");
-    EXPECT_EQ(post(QByteArray(120000, 'x')).status, 400) << "not even a part";
-    EXPECT_EQ(told(post(partOf(QByteArray(49000, 'x')) + partOf(QByteArray(60000, 'x')) + "--cut--")),
-              "413 :C000 :A700");
-    EXPECT_EQ(told(post(part.repeated(4) + "--cut--")), "202 1.2.3.1 1.2.3.1 1.2.3.1");
+    const QByteArray large = partOf(QByteArray(60000, 'x'));
+    const std::tuple<const char*, QByteArray, const char*> kBodies[] = {
+        {"no part", "nothing of it", "400"},
+        {"not even a part", QByteArray(120000, 'x'), "400"},
+        {"the end is missing", part + part.left(part.size() - 20), "202 1.2.3.1 :C000"},
+        {"nothing tells that it is whole", part, "400 :C000"},
+        {"large object", large + "--cut--", "409 :A700"},
+        {"large body", partOf(QByteArray(49000, 'x')) + large + "--cut--", "413 :C000 :A700"},
+        {"many parts", part.repeated(4) + "--cut--", "202 1.2.3.1 1.2.3.1 1.2.3.1"},
+    };
+    for (const auto& [name, body, answer] : kBodies)
+        EXPECT_EQ(told(post(body)), answer) << name;
     mSettings.objects->freeBytes = qint64(1) << 60;
     start();
     const Reply full = post(part);

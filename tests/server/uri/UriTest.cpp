@@ -25,15 +25,7 @@ protected:
 };
 
 /// What is asked of an image with so many frames, by which Accept, and what is given; a number is a refusal.
-struct Form
-{
-    int frames;
-    const char* parameters;
-    const char* accept;
-    const char* given;
-};
-
-const Form kForms[] = {
+const std::tuple<int, const char*, const char*, const char*> kForms[] = {
     {1, "", "*/*", "image/jpeg"},
     {2, "", "*/*", "application/dicom; transfer-syntax=1.2.840.10008.1.2.1"},
     {2, "frameNumber=2", "*/*", "image/jpeg"},
@@ -72,27 +64,26 @@ const Form kForms[] = {
 TEST_F(UriTest, GivesTheFormThatIsAskedForOrTellsWhyNot)
 {
     int frames = 0;
-    for (const Form& row : kForms) {
-        if (row.frames != frames)
-            add("a.dcm", anImageWithFrames(row.frames));
-        frames = row.frames;
-        Http::Response response = object(row.parameters, row.accept);
+    for (const auto& [count, parameters, accept, expected] : kForms) {
+        if (count != frames)
+            add("a.dcm", anImageWithFrames(count));
+        frames = count;
+        Http::Response response = object(parameters, accept);
         const QByteArray given =
-            response.status == 200 ? header(response, "Content-Type") : QByteArray::number(response.status);
-        EXPECT_EQ(given, row.given) << row.parameters << ' ' << row.accept;
+            response.status == 200 ? headerOf(response, "Content-Type") : QByteArray::number(response.status);
+        EXPECT_EQ(given, expected) << parameters << ' ' << accept;
     }
 }
 
 TEST_F(UriTest, NeedsAllItsParameters)
 {
     add("a.dcm", anImageWithFrames(1));
-    const QByteArray whole = kObject;
     for (const char* name : {"requestType", "studyUID", "seriesUID", "objectUID"})
-        EXPECT_EQ(getByUri(QByteArray(whole).replace(name, "other")).status, 400) << name;
-    EXPECT_EQ(getByUri(QByteArray(whole).replace("WADO", "QIDO")).status, 400);
-    EXPECT_EQ(getByUri(QByteArray(whole).replace("studyUID=1.2", "studyUID=../1.2")).status, 400);
-    EXPECT_EQ(getByUri(QByteArray(whole).replace("studyUID=1.2", "studyUID=1.9")).status, 404);
-    EXPECT_EQ(getByUri(QByteArray(whole).replace("seriesUID=1.2.3", "seriesUID=1.2.4")).status, 404);
+        EXPECT_EQ(getByUri(QByteArray(kObject).replace(name, "other")).status, 400) << name;
+    EXPECT_EQ(getByUri(QByteArray(kObject).replace("WADO", "QIDO")).status, 400);
+    EXPECT_EQ(getByUri(QByteArray(kObject).replace("studyUID=1.2", "studyUID=../1.2")).status, 400);
+    EXPECT_EQ(getByUri(QByteArray(kObject).replace("studyUID=1.2", "studyUID=1.9")).status, 404);
+    EXPECT_EQ(getByUri(QByteArray(kObject).replace("seriesUID=1.2.3", "seriesUID=1.2.4")).status, 404);
 }
 
 TEST_F(UriTest, DrawsAsThePathsDo)
@@ -106,11 +97,8 @@ TEST_F(UriTest, DrawsAsThePathsDo)
         "contentType=image/png&frameNumber=1&region=0.5,0.25,1,0.75&windowCenter=2000&windowWidth=900");
     const QImage whole = picture("contentType=image/png&frameNumber=1&windowCenter=2000&windowWidth=900");
     EXPECT_EQ(cut, whole.copy(8, 4, 8, 8));
-    Http::Request request;
-    request.headers = {{"accept", "image/png"}};
-    request.query = {{"window", "2000,900,linear"}};
-    Http::Response path = get(QByteArray(kInstance) + "/frames/1/rendered", request);
-    EXPECT_EQ(QImage::fromData(bodyOf(path)), whole);
+    const QByteArray path = kInstance + "/frames/1/rendered?window=2000,900,linear";
+    EXPECT_EQ(QImage::fromData(bodyOf(get(path, "image/png"))), whole);
 }
 
 }  // namespace

@@ -164,8 +164,7 @@ class SearchOracle : public SearchedArchive
 {
 };
 
-INSTANTIATE_TEST_SUITE_P(Engines, SearchOracle, testing::Values(Engine::Sqlite, Engine::Postgres),
-                         engineName);
+INSTANTIATE_TEST_SUITE_P(Engines, SearchOracle, kBothEngines, engineName);
 
 /// A value of the archive, or a piece of one with wildcards.
 QString question(const QString& value, bool isDate, std::mt19937& random)
@@ -220,7 +219,7 @@ TEST_P(SearchOracle, AgreesOnRandomQuestionsOverRealFiles)
     // Only what was taken in, from the files that are shown.
     QMap<QString, QString> shown;
     for (const QJsonValue& each : list("studies?limit=1000")) {
-        const QString uid = textOf(each.toObject(), "0020000D");
+        const QString uid = textOf(each, "0020000D");
         TagFile file;
         ASSERT_TRUE(file.readCacheFileForStudy(uid.toLatin1().constData(), false));
         for (const TagMap* image : file.imagesByUID()) {
@@ -250,8 +249,8 @@ TEST_P(SearchOracle, AgreesOnRandomQuestionsOverRealFiles)
                                       .rightJustified(8, '0') +
                                   '=' + query.toUtf8().toPercentEncoding();
         QStringList studies;
-        for (const QJsonValue& each : list(target.constData()))
-            studies << textOf(each.toObject(), "0020000D");
+        for (const QJsonValue& each : list(target))
+            studies << textOf(each, "0020000D");
         studies.sort();
         EXPECT_EQ(studies.join(QLatin1Char(' ')).toStdString(),
                   oracle.find(key, query).join(QLatin1Char(' ')).toStdString())

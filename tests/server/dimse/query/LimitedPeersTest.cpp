@@ -20,21 +20,12 @@ protected:
                                             {{}, {}, 0, false, Dimse::kAllRights, onlyPatient("P1")});
         fill();
     }
-
-    const QStringList mLimited = {QStringLiteral("-aet"), QStringLiteral("LIMITED")};
 };
 
-INSTANTIATE_TEST_SUITE_P(Engines, LimitedPeers,
-                         testing::Values(DicomWeb::Engine::Sqlite, DicomWeb::Engine::Postgres),
-                         DicomWeb::engineName);
+INSTANTIATE_TEST_SUITE_P(Engines, LimitedPeers, kBothEngines, engineName);
 
-const struct
-{
-    const char* level;
-    const char* keys;
-    const char* all;   // images that are had
-    const char* seen;  // by who is limited
-} kWishes[] = {
+/// The images that are had, and those of them that who is limited gets.
+const std::tuple<const char*, const char*, const char*, const char*> kWishes[] = {
     {"STUDY", "StudyInstanceUID=1\\2", "1.1.1 1.1.2 1.2.1 2.1.1", "1.1.1 1.1.2 1.2.1"},
     {"STUDY", "StudyInstanceUID=1", "1.1.1 1.1.2 1.2.1", "1.1.1 1.1.2 1.2.1"},
     {"STUDY", "StudyInstanceUID=2", "2.1.1", ""},
@@ -49,45 +40,34 @@ const struct
 
 TEST_P(LimitedPeers, GetWhatIsNamedOnEveryLevelButNothingThatTheyMayNotSee)
 {
-    for (const auto& each : kWishes) {
-        const QStringList keys = onLevel(each.level, keysOf(each.keys));
-        get(keys);
-        EXPECT_EQ(answered(DCM_SOPInstanceUID), each.all) << "C-GET " << each.keys;
-        move(keys);
-        EXPECT_EQ(answered(DCM_SOPInstanceUID), each.all) << "C-MOVE " << each.keys;
-        const std::string got = get(keys, mLimited);
-        EXPECT_EQ(answered(DCM_SOPInstanceUID), each.seen) << "C-GET " << each.keys << '\n' << got;
-        const std::string moved = move(keys, mLimited);
-        EXPECT_EQ(answered(DCM_SOPInstanceUID), each.seen) << "C-MOVE " << each.keys << '\n' << moved;
-        EXPECT_THAT(moved, HasSubstr("Received Final Move Response (Success)")) << each.keys;
+    for (const auto& [level, named, all, seen] : kWishes) {
+        const QByteArray keys = onLevel(level, named);
+        for (const auto& [options, images] : {std::pair("", all), std::pair("-aet LIMITED", seen)}) {
+            const std::string got = get(keys, options);
+            EXPECT_EQ(answered(DCM_SOPInstanceUID), images) << "C-GET " << named << options << '\n' << got;
+            const std::string moved = move(keys, options);
+            EXPECT_EQ(answered(DCM_SOPInstanceUID), images) << "C-MOVE " << named << options << '\n' << moved;
+            EXPECT_THAT(moved, HasSubstr("Received Final Move Response (Success)")) << named << options;
+        }
     }
-    run("getscu", {QStringLiteral("-P")}, onLevel("PATIENT", keysOf("PatientID=P1")));
+    run("getscu", "-P", onLevel("PATIENT", "PatientID=P1"));
     EXPECT_EQ(answered(DCM_SOPInstanceUID), "1.1.1 1.1.2 1.2.1");
 }
 
 TEST_P(LimitedPeers, FindNothingOfStudiesThatTheyMayNotSee)
 {
-    const struct
-    {
-        const char* level;
-        const char* keys;
-        DcmTagKey shown;
-        const char* seen;
-    } kQuestions[] = {
-        {"STUDY", "StudyInstanceUID", DCM_StudyInstanceUID, "1"},
-        {"STUDY", "StudyInstanceUID=2", DCM_StudyInstanceUID, ""},
-        {"SERIES", "SeriesInstanceUID", DCM_SeriesInstanceUID, "1.1 1.2"},
-        {"IMAGE", "SOPInstanceUID=2.1.1", DCM_SOPInstanceUID, ""},
-        {"IMAGE", "StudyInstanceUID=2|SOPInstanceUID", DCM_SOPInstanceUID, ""},
+    const std::tuple<const char*, const char*, const char*, DcmTagKey, const char*> kQuestions[] = {
+        {"-S", "STUDY", "StudyInstanceUID", DCM_StudyInstanceUID, "1"},
+        {"-S", "STUDY", "StudyInstanceUID=2", DCM_StudyInstanceUID, ""},
+        {"-S", "SERIES", "SeriesInstanceUID", DCM_SeriesInstanceUID, "1.1 1.2"},
+        {"-S", "IMAGE", "SOPInstanceUID=2.1.1", DCM_SOPInstanceUID, ""},
+        {"-S", "IMAGE", "StudyInstanceUID=2|SOPInstanceUID", DCM_SOPInstanceUID, ""},
+        {"-P", "PATIENT", "PatientID", DCM_PatientID, "P1"},
     };
-    for (const auto& each : kQuestions) {
-        run("findscu", QStringList{QStringLiteral("-S"), QStringLiteral("-X")} + mLimited,
-            onLevel(each.level, keysOf(each.keys)));
-        EXPECT_EQ(answered(each.shown), each.seen) << each.keys;
+    for (const auto& [root, level, keys, shown, seen] : kQuestions) {
+        find(onLevel(level, keys), root + QByteArray(" -aet LIMITED"));
+        EXPECT_EQ(answered(shown), seen) << keys;
     }
-    run("findscu", QStringList{QStringLiteral("-P"), QStringLiteral("-X")} + mLimited,
-        onLevel("PATIENT", keysOf("PatientID")));
-    EXPECT_EQ(answered(DCM_PatientID), "P1");
 }
 
 }  // namespace

@@ -8,6 +8,12 @@
 namespace Kdd
 {
 
+/// "STUDY" and the keys that ask on that level.
+inline QByteArray onLevel(const QByteArray& level, const QByteArray& keys)
+{
+    return "QueryRetrieveLevel=" + level + '|' + keys;
+}
+
 /// An archive that answers associations, and DCMTK's tools that ask it. "SELF" is where the tools take objects.
 class QueriedArchive : public DicomWeb::SearchedArchive
 {
@@ -36,83 +42,78 @@ protected:
     /// Two images of one series and one of another, of one patient, and one of another patient.
     void fill()
     {
-        store("a",
-              anImage("1.1.1").inStudy("1").inSeries("1.1").with(DCM_PatientID, "P1").words({1, 2, 3, 4}));
-        store("b",
-              anImage("1.1.2").inStudy("1").inSeries("1.1").with(DCM_PatientID, "P1").words({5, 6, 7, 8}));
-        store("c", anImage("1.2.1").inStudy("1").inSeries("1.2").with(DCM_PatientID, "P1"));
-        store("d", anImage("2.1.1").inStudy("2").inSeries("2.1").with(DCM_PatientID, "P2"));
+        const auto image = [](const char* sop, const char* study, const char* series, const char* patient) {
+            return anImage(sop).inStudy(study).inSeries(series).with(DCM_PatientID, patient);
+        };
+        store("a", image("1.1.1", "1", "1.1", "P1").words({1, 2, 3, 4}));
+        store("b", image("1.1.2", "1", "1.1", "P1").words({5, 6, 7, 8}));
+        store("c", image("1.2.1", "1", "1.2", "P1"));
+        store("d", image("2.1.1", "2", "2.1", "P2"));
         add();
         start();
     }
 
-    std::string getStudy(const char* uid, const QStringList& more = {})
-    {
-        return get({QStringLiteral("QueryRetrieveLevel=STUDY"),
-                    QStringLiteral("StudyInstanceUID=") + QLatin1String(uid)},
-                   more);
-    }
-
-    std::string moveStudy(const char* uid, const QStringList& more = {}, const char* to = "SELF")
-    {
-        return move({QStringLiteral("QueryRetrieveLevel=STUDY"),
-                     QStringLiteral("StudyInstanceUID=") + QLatin1String(uid)},
-                    more, to);
-    }
-
-    /// Starts a tool; `keys` as "PatientName=D*".
-    std::unique_ptr<QProcess> begin(const char* tool, const QStringList& options, const QStringList& keys,
+    /// Starts a tool; keys as "PatientName=D*|PatientID", and files with keys.
+    std::unique_ptr<QProcess> begin(const char* tool, const QByteArray& options, const QByteArray& keys,
                                     const QStringList& files = {})
     {
         mAnswers = path("answers") + QString::number(++mRuns);
         QDir().mkpath(mAnswers);
-        QStringList arguments = {QStringLiteral("-v"), QStringLiteral("-od"), mAnswers};
-        arguments += options;
-        for (const QString& key : keys)
+        QStringList arguments = words("-v " + options + " -od " + mAnswers.toUtf8());
+        for (const QString& key : QString::fromUtf8(keys).split(QLatin1Char('|')))
             arguments << QStringLiteral("-k") << key;
         arguments << QStringLiteral("127.0.0.1") << QString::number(port());
-        arguments += files;
         auto process = std::make_unique<QProcess>();
         process->setWorkingDirectory(mAnswers);
         process->setProcessChannelMode(QProcess::MergedChannels);
-        process->start(QLatin1String(tool), arguments);
+        process->start(QLatin1String(tool), arguments + files);
         return process;
     }
 
-    std::string run(const char* tool, const QStringList& options, const QStringList& keys)
+    std::string run(const char* tool, const QByteArray& options, const QByteArray& keys)
     {
         const std::unique_ptr<QProcess> process = begin(tool, options, keys);
         EXPECT_TRUE(process->waitForFinished(120000)) << tool << process->errorString().toStdString();
         return process->readAll().toStdString();
     }
 
-    std::string find(const QStringList& keys, const char* root = "-S")
+    std::string find(const QByteArray& keys, const QByteArray& options = "-S")
     {
-        return run("findscu", {QLatin1String(root), QStringLiteral("-X")}, keys);
+        return run("findscu", options + " -X", keys);
     }
 
-    std::string move(const QStringList& keys, const QStringList& more = {}, const char* to = "SELF")
+    std::string get(const QByteArray& keys, const QByteArray& options = {})
     {
-        return run("movescu",
-                   QStringList{QStringLiteral("-S"), QStringLiteral("-aem"), QLatin1String(to),
-                               QStringLiteral("+P"), QString::number(mSelf)} +
-                       more,
-                   keys);
+        return run("getscu", "-S " + options, keys);
     }
 
-    std::string get(const QStringList& keys, const QStringList& more = {})
+    /// To "SELF" it takes the objects itself.
+    QByteArray moving(const QByteArray& to) const
     {
-        return run("getscu", QStringList{QStringLiteral("-S")} + more, keys);
+        return "-S -aem " + to + " +P " + QByteArray::number(mSelf) + ' ';
+    }
+    std::string move(const QByteArray& keys, const QByteArray& options = {}, const QByteArray& to = "SELF")
+    {
+        return run("movescu", moving(to) + options, keys);
+    }
+
+    std::string getStudy(const QByteArray& uid, const QByteArray& options = {})
+    {
+        return get(onLevel("STUDY", "StudyInstanceUID=" + uid), options);
+    }
+    std::string moveStudy(const QByteArray& uid, const QByteArray& options = {},
+                          const QByteArray& to = "SELF")
+    {
+        return move(onLevel("STUDY", "StudyInstanceUID=" + uid), options, to);
     }
 
     using SearchedArchive::get;
 
     /// The dataset of an object as it is retrieved over HTTP, as stored.
-    QByteArray retrieved(const char* path) const
+    QByteArray retrieved(const QByteArray& path) const
     {
-        return datasetOf(ask(*mServer, "GET", QByteArray("/dicom-web/") + path,
-                             "Accept: application/dicom; transfer-syntax=*\r\n")
-                             .body);
+        const QByteArray accept = "Accept: application/dicom; transfer-syntax=*\r\n";
+        return datasetOf(ask(*mServer, "GET", "/dicom-web/" + path, accept).body);
     }
 
     /// The datasets of the objects that the last run left, as they came.
@@ -163,18 +164,5 @@ protected:
 private:
     int mRuns = 0;
 };
-
-/// "STUDY" and the keys that ask on that level.
-inline QStringList onLevel(const char* level, QStringList keys)
-{
-    keys.prepend(QStringLiteral("QueryRetrieveLevel=") + QLatin1String(level));
-    return keys;
-}
-
-/// Separated by "|".
-inline QStringList keysOf(const char* keys)
-{
-    return QString::fromUtf8(keys).split(QLatin1Char('|'));
-}
 
 }  // namespace Kdd

@@ -23,13 +23,14 @@ protected:
     }
 
     /// DCMTK's storescp, with options of its own.
-    void startDestination(const QStringList& options, bool isSecure = false)
+    void startDestination(const QByteArray& options, const QStringList& more = {}, bool isSecure = false)
     {
         mThere = freePort();
         mSettings.dimse->rules.peers.insert("THERE", {{}, "127.0.0.1", mThere, isSecure, Dimse::kAllRights});
         QDir().mkpath(path("there"));
-        mDestination.start(QStringLiteral("storescp"), QStringList{QStringLiteral("-od"), path("there")} +
-                                                           options + QStringList{QString::number(mThere)});
+        mDestination.start(QStringLiteral("storescp"),
+                           words("-od " + path("there").toUtf8() + ' ' + options) + more +
+                               QStringList{QString::number(mThere)});
         while (!isListening(mThere))
             ASSERT_FALSE(mDestination.waitForFinished(20));
     }
@@ -37,50 +38,43 @@ protected:
     int taken() const { return QDir(path("there")).entryList(QDir::Files).size(); }
 
     /// Takes an object and goes on when somebody makes a file of that name, or the test has ended.
-    QStringList waitingFor(const QString& file) const
+    void startWaitingFor(const char* file)
     {
-        return {
-            QStringLiteral("--exec-sync"), QStringLiteral("-xcr"),
-            QStringLiteral("while [ -d %1 ] && [ ! -e %2 ]; do sleep 0.1; done").arg(path("there"), file)};
+        startDestination("--exec-sync -xcr",
+                         {QStringLiteral("while [ -d %1 ] && [ ! -e %2 ]; do sleep 0.1; done")
+                              .arg(path("there"), path(file))});
     }
 
     /// A retrieval that has given its first object to who waits for that file.
     std::unique_ptr<QProcess> beginMove()
     {
-        auto moving =
-            begin("movescu",
-                  {QStringLiteral("-S"), QStringLiteral("-d"), QStringLiteral("-aem"),
-                   QStringLiteral("THERE"), QStringLiteral("+P"), QString::number(mSelf)},
-                  {QStringLiteral("QueryRetrieveLevel=STUDY"), QStringLiteral("StudyInstanceUID=1")});
+        auto process = begin("movescu", moving("THERE") + "-d", onLevel("STUDY", "StudyInstanceUID=1"));
         while (taken() == 0) {
-            if (moving->waitForFinished(20)) {
-                ADD_FAILURE() << moving->readAll().constData();
+            if (process->waitForFinished(20)) {
+                ADD_FAILURE() << process->readAll().constData();
                 break;
             }
         }
-        return moving;
+        return process;
     }
 
     quint16 mThere = 0;
     QProcess mDestination;
 };
 
-INSTANTIATE_TEST_SUITE_P(Engines, RetrieveEnds, testing::Values(DicomWeb::Engine::Sqlite),
-                         DicomWeb::engineName);
+INSTANTIATE_TEST_SUITE_P(Engines, RetrieveEnds, testing::Values(Engine::Sqlite), engineName);
 
 TEST_P(RetrieveEnds, SendsOverTlsToWhoseCertificateIsGood)
 {
     const TlsFiles own;
     const TlsFiles theirs;
     const TlsFiles others;
-    const auto text = [](const QByteArray& name) { return QString::fromLocal8Bit(name); };
     mSettings.dimse->tls = {own.certificate(), own.key(), theirs.certificate(), false};
     for (const bool isGood : {true, false}) {
         const TlsFiles& shown = isGood ? theirs : others;
         mDestination.kill();
         mDestination.waitForFinished(-1);
-        startDestination({QStringLiteral("+tls"), text(shown.key()), text(shown.certificate()),
-                          QStringLiteral("+cf"), text(own.certificate())},
+        startDestination("+tls " + shown.key() + ' ' + shown.certificate() + " +cf " + own.certificate(), {},
                          true);
         if (isGood)
             fill();
@@ -110,7 +104,7 @@ TEST_P(RetrieveEnds, SendsOverTlsToWhoseCertificateIsGood)
 TEST_P(RetrieveEnds, TheObjectThatIsBeingSentIsTheLastWhenTheServerStops)
 {
     mSettings.dimse->stop = std::chrono::hours(1);
-    startDestination(waitingFor(path("go")));
+    startWaitingFor("go");
     fill();
     const auto moving = beginMove();
     std::thread stopping([this] { mServer->stop(); });
@@ -128,7 +122,7 @@ TEST_P(RetrieveEnds, ADestinationThatAnswersNoMoreHoldsNoStopUp)
 {
     mSettings.dimse->stop = std::chrono::milliseconds(100);
     mSettings.dimse->patience = std::chrono::hours(1);
-    startDestination(waitingFor(path("never")));
+    startWaitingFor("never");
     fill();
     const auto moving = beginMove();
     mServer->stop();

@@ -9,43 +9,33 @@ using testing::HasSubstr;
 namespace
 {
 
-const char* const kBitByBit = "+B";
+using RetrieveObjects = QueriedArchive;
 
-class RetrieveObjects : public QueriedArchive
-{
-};
-
-INSTANTIATE_TEST_SUITE_P(Engines, RetrieveObjects, testing::Values(DicomWeb::Engine::Sqlite),
-                         DicomWeb::engineName);
-
-const char* const kCorrectedName = "Group='0010' Element='0010'";
-const char* const kStudyTag = "Group='0020' Element='000d'";
+INSTANTIATE_TEST_SUITE_P(Engines, RetrieveObjects, testing::Values(Engine::Sqlite), engineName);
 
 TEST_P(RetrieveObjects, GivesThemCorrectedAsOverHttp)
 {
     fill();
-    correct("1", "1.1.1", "", kCorrectedName, "Right^Name");
-    const QStringList keys =
-        onLevel("IMAGE", keysOf("StudyInstanceUID=1|SeriesInstanceUID=1.1|SOPInstanceUID=1.1.1"));
-    get(keys, {QLatin1String(kBitByBit)});
-    ASSERT_EQ(takenDatasets().size(), 1U);
-    EXPECT_EQ(takenDatasets().front(), retrieved("studies/1/series/1.1/instances/1.1.1"));
+    correct("1", "1.1.1", DCM_PatientName, "Right^Name");
+    const QByteArray keys = onLevel("IMAGE", "StudyInstanceUID=1|SeriesInstanceUID=1.1|SOPInstanceUID=1.1.1");
+    get(keys, "+B");
+    const std::vector<QByteArray> expected = {retrieved("studies/1/series/1.1/instances/1.1.1")};
+    EXPECT_EQ(takenDatasets(), expected);
     EXPECT_EQ(answered(DCM_PatientName), "Right^Name");
-    move(keys, {QLatin1String(kBitByBit)});
-    ASSERT_EQ(takenDatasets().size(), 1U);
-    EXPECT_EQ(takenDatasets().front(), retrieved("studies/1/series/1.1/instances/1.1.1"));
+    move(keys, "+B");
+    EXPECT_EQ(takenDatasets(), expected);
 }
 
 TEST_P(RetrieveObjects, GivesAMovedImageUnderItsNewStudyOnly)
 {
     fill();
-    correct("2", "1.1.1", "1", kStudyTag, "2");
+    correct("2", "1.1.1", DCM_StudyInstanceUID, "2", "1");
     getStudy("1");
     EXPECT_EQ(answered(DCM_SOPInstanceUID), "1.1.2 1.2.1");
     getStudy("2");
     EXPECT_EQ(answered(DCM_SOPInstanceUID), "1.1.1 2.1.1");
     EXPECT_EQ(answered(DCM_StudyInstanceUID), "2 2");
-    find(onLevel("IMAGE", keysOf("SOPInstanceUID=1.1.1|StudyInstanceUID")));
+    find(onLevel("IMAGE", "SOPInstanceUID=1.1.1|StudyInstanceUID"));
     EXPECT_EQ(answered(DCM_StudyInstanceUID), "2");
 }
 
@@ -61,8 +51,8 @@ TEST_P(RetrieveObjects, RefusesWhatNamesNothing)
 {
     fill();
     for (const char* keys : kNotUnderstood) {
-        EXPECT_THAT(move(keysOf(keys)), HasSubstr("DataSetDoesNotMatchSOPClass")) << keys;
-        EXPECT_THAT(get(keysOf(keys)), HasSubstr("DataSetDoesNotMatchSOPClass")) << keys;
+        EXPECT_THAT(move(keys), HasSubstr("DataSetDoesNotMatchSOPClass")) << keys;
+        EXPECT_THAT(get(keys), HasSubstr("DataSetDoesNotMatchSOPClass")) << keys;
         EXPECT_TRUE(answers().empty()) << keys;
     }
 }
@@ -72,7 +62,7 @@ TEST_P(RetrieveObjects, TellsADestinationThatItCannotCall)
     fill();
     EXPECT_THAT(moveStudy("1", {}, "STRANGER"), HasSubstr("MoveDestinationUnknown"));
     EXPECT_THAT(moveStudy("1", {}, "UNCALLED"), HasSubstr("MoveDestinationUnknown"));
-    const std::string said = moveStudy("1", {QStringLiteral("-d")}, "NOBODY");
+    const std::string said = moveStudy("1", "-d", "NOBODY");
     EXPECT_THAT(said, HasSubstr("OutOfResourcesSubOperations"));
     EXPECT_THAT(said, HasSubstr("Failed Suboperations          : 3"));
 }
@@ -81,24 +71,18 @@ TEST_P(RetrieveObjects, TellsWhichOfThemCannotBeSent)
 {
     fill();
     QFile::remove(path("images/b"));
-    const std::string moved = moveStudy("1", {QStringLiteral("-d")});
+    const std::string moved = moveStudy("1", "-d");
     EXPECT_EQ(answered(DCM_SOPInstanceUID), "1.1.1 1.2.1");
     EXPECT_THAT(moved, HasSubstr("Warning: SubOperationsCompleteOneOrMoreFailures"));
     EXPECT_THAT(moved, HasSubstr("(0008,0058) UI [1.1.2]"));
     EXPECT_THAT(moved, HasSubstr("Completed Suboperations       : 2"));
     const std::string got = getStudy("1");
     EXPECT_EQ(answered(DCM_SOPInstanceUID), "1.1.1 1.2.1");
-    EXPECT_TRUE(got.find("Number of Failed Suboperations    : 1") != std::string::npos) << got;
+    EXPECT_THAT(got, HasSubstr("Number of Failed Suboperations    : 1"));
 }
 
-struct StoredForm
-{
-    const char* file;
-    E_TransferSyntax syntax;
-    const char* option;  ///< by which the tool takes it
-};
-
-const StoredForm kForms[] = {
+/// Files of forms, and the option by which the tool takes each.
+const std::tuple<const char*, E_TransferSyntax, const char*> kForms[] = {
     {"rle/MR_small_RLE.dcm", EXS_RLELossless, "+xr"},
     {"jpeg-ls-80/CT0012.fragmented_no_bot_jpeg_ls.80.dcm", EXS_JPEGLSLossless, "+xt"},
     {"jpeg2000-lossless-90/693_J2KR.dcm", EXS_JPEG2000LosslessOnly, "+xv"},
@@ -111,26 +95,24 @@ TEST_P(RetrieveObjects, GivesAsStoredWhatIsTakenSoAndDecodesTheRest)
     if (realFilesFolder().isEmpty())
         GTEST_SKIP() << "KDD_TEST_DATA is not set";
     int number = 0;
-    for (const StoredForm& each : kForms)
+    for (const auto& [name, syntax, option] : kForms)
         ASSERT_TRUE(
-            QFile::copy(realFilesFolder() + QLatin1String("/transfer-syntaxes/") + QLatin1String(each.file),
+            QFile::copy(realFilesFolder() + QLatin1String("/transfer-syntaxes/") + QLatin1String(name),
                         path("images/") + QString::number(number++)));
     add();
     start();
     number = 0;
-    for (const StoredForm& each : kForms) {
+    for (const auto& [name, syntax, option] : kForms) {
         DcmFileFormat file;
         ASSERT_TRUE(file.loadFile((path("images/") + QString::number(number++)).toUtf8().constData()).good());
-        const std::string uid = text(file, DCM_StudyInstanceUID);
-        moveStudy(uid.c_str(), {QLatin1String(each.option)});
-        ASSERT_EQ(answers().size(), 1U) << each.file;
-        EXPECT_EQ(answers().front().getDataset()->getOriginalXfer(), each.syntax) << each.file;
+        const QByteArray uid = QByteArray::fromStdString(text(file, DCM_StudyInstanceUID));
+        moveStudy(uid, option);
+        ASSERT_EQ(answers().size(), 1U) << name;
+        EXPECT_EQ(answers().front().getDataset()->getOriginalXfer(), syntax) << name;
         for (const bool isMoved : {true, false}) {
-            const std::string said =
-                isMoved ? moveStudy(uid.c_str(), {QStringLiteral("+xi")}) : getStudy(uid.c_str());
-            ASSERT_EQ(answers().size(), 1U) << each.file << said;
-            EXPECT_FALSE(DcmXfer(answers().front().getDataset()->getOriginalXfer()).isEncapsulated())
-                << each.file;
+            const std::string said = isMoved ? moveStudy(uid, "+xi") : getStudy(uid);
+            ASSERT_EQ(answers().size(), 1U) << name << said;
+            EXPECT_FALSE(DcmXfer(answers().front().getDataset()->getOriginalXfer()).isEncapsulated()) << name;
         }
     }
 }
@@ -143,7 +125,7 @@ TEST_P(RetrieveObjects, EndsWhenItIsCancelled)
     }
     add();
     start();
-    EXPECT_THAT(moveStudy("7", {QStringLiteral("--cancel"), QStringLiteral("1")}),
+    EXPECT_THAT(moveStudy("7", "--cancel 1"),
                 HasSubstr("Cancel: SubOperationsTerminatedDueToCancelIndication"));
     EXPECT_LT(answers().size(), 60U);
 }
@@ -155,11 +137,11 @@ TEST_P(RetrieveObjects, TellsWhatADestinationTookThatDied)
     fill();
     QProcess destination;
     destination.start(QStringLiteral("storescp"),
-                      {QStringLiteral("-od"), path("images"), QStringLiteral("-xs"), QStringLiteral("-xcr"),
-                       QStringLiteral("kill -9 $PPID"), QString::number(port)});
+                      words("-od " + path("images").toUtf8() + " -xs -xcr") +
+                          QStringList{QStringLiteral("kill -9 $PPID"), QString::number(port)});
     while (!isListening(port))
         ASSERT_FALSE(destination.waitForFinished(20));
-    const std::string said = moveStudy("1", {QStringLiteral("-d")}, "DYING");
+    const std::string said = moveStudy("1", "-d", "DYING");
     EXPECT_TRUE(destination.waitForFinished(60000));
     EXPECT_THAT(said, HasSubstr("Warning: SubOperationsCompleteOneOrMoreFailures"));
     EXPECT_THAT(said, HasSubstr("Completed Suboperations       : 1"));
@@ -180,15 +162,13 @@ TEST_P(RetrieveObjects, OutlivesHostileIdentifiers)
         {"huge", anItem().withLong(DCM_TextValue, 200000)},
         {"endless", anItem().withLong(DCM_TextValue, 3000000)},
     };
-    for (const auto& each : hostile) {
-        each.second.save(path(each.first), EXS_LittleEndianImplicit);
+    for (const auto& [name, identifier] : hostile) {
+        identifier.save(path(name), EXS_LittleEndianImplicit);
         for (const char* tool : {"findscu", "getscu", "movescu"}) {
-            const std::unique_ptr<QProcess> process = begin(
-                tool, {QStringLiteral("-S")}, onLevel("STUDY", keysOf("PatientName=*")), {path(each.first)});
-            EXPECT_TRUE(process->waitForFinished(120000)) << tool << each.first;
+            const auto process = begin(tool, "-S", onLevel("STUDY", "PatientName=*"), {path(name)});
+            EXPECT_TRUE(process->waitForFinished(120000)) << tool << name;
         }
-        EXPECT_THAT(find(onLevel("STUDY", keysOf("StudyInstanceUID=1"))), HasSubstr("(Success)"))
-            << each.first;
+        EXPECT_THAT(find(onLevel("STUDY", "StudyInstanceUID=1")), HasSubstr("(Success)")) << name;
     }
 }
 
@@ -198,10 +178,9 @@ TEST_P(RetrieveObjects, AnswersManyAtOnceThoughSomeAreKilled)
     std::vector<std::unique_ptr<QProcess>> asking;
     std::vector<QString> folders;
     for (int i = 0; i < 24; ++i) {
-        asking.push_back(i % 3 == 0 ? begin("findscu", {QStringLiteral("-S"), QStringLiteral("-X")},
-                                            onLevel("IMAGE", keysOf("StudyInstanceUID=1|SOPInstanceUID")))
-                                    : begin("getscu", {QStringLiteral("-S")},
-                                            onLevel("STUDY", keysOf("StudyInstanceUID=1"))));
+        asking.push_back(
+            i % 3 == 0 ? begin("findscu", "-S -X", onLevel("IMAGE", "StudyInstanceUID=1|SOPInstanceUID"))
+                       : begin("getscu", "-S", onLevel("STUDY", "StudyInstanceUID=1")));
         folders.push_back(mAnswers);
     }
     for (std::size_t i = 0; i < asking.size(); ++i) {
