@@ -105,7 +105,7 @@ private:
         static const QList<QByteArray> kPlain =
             QByteArray(
                 R"(|A|A\B|A\|A\B\\C|1\\2|\|a  |  a|~|say "x"|19990101|Doe^John|Doe^J=X^Y=Z|^|A^|=|A==B)"
-                R"(|=PatientRootQuery|12|-1.5|007|+3|1e3|1E-3|.5| 5 |5.|1.|-0|--1|-|0.0|00.5|1.2.840|1.2 .3)")
+                R"(|=PatientRootQuery|12|-1.5|007|+3|1e3|1E-3|.5| 5 |-0|--1|-|0.0|00.5|1.2.840|1.2 .3)")
                 .split('|');
         static const char* const kEncoded[] = {
             "M\xfcller",   "M\xc3\xbcller", "M\xfc\\N\xf6^x",   "\xbb\xee\xda", "\x1b$B;3ED\x1b(B",

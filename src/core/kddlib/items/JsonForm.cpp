@@ -87,6 +87,9 @@ bool isPlainInteger(const char* begin, const char* end)
 
 bool isPlainDecimal(const char* begin, const char* end)
 {
+    // That of most digits that a double can be.
+    if (end - begin > std::numeric_limits<double>::max_exponent10)
+        return false;
     const char* at = pastInteger(begin, end);
     if (at == nullptr || at == end)
         return at != nullptr;
@@ -221,6 +224,62 @@ bool plainUnknown(QByteArray& out, const DcmTagKey& key, const QByteArray& bytes
     return true;
 }
 
+/// Appends a number of DICOM in the form that JSON has for it: no zeros in front, digits on both sides of the point, and no "+".
+/// False, with nothing appended, when it is none, or none that readers can hold. DCMTK leaves the point of "1." and makes "e3"
+/// of "0e3".
+bool appendNumber(QByteArray& out, const char* at, const char* end)
+{
+    const bool isNegative = at != end && *at == '-';
+    at += at != end && (*at == '-' || *at == '+') ? 1 : 0;
+    const char* whole = at;
+    const char* const wholeEnd = skipDigits(at, end);
+    const char* const fraction = wholeEnd != end && *wholeEnd == '.' ? wholeEnd + 1 : wholeEnd;
+    const char* const fractionEnd = fraction != wholeEnd ? skipDigits(fraction, end) : fraction;
+    if (whole == wholeEnd && fraction == fractionEnd)
+        return false;
+    const char* exponent = fractionEnd;
+    bool isSmall = false;  // the exponent is negative
+    const bool hasExponent = exponent != end && (*exponent == 'e' || *exponent == 'E');
+    if (hasExponent && ++exponent != end && (*exponent == '-' || *exponent == '+'))
+        isSmall = *exponent++ == '-';
+    if (skipDigits(exponent, end) != end || (hasExponent && exponent == end))
+        return false;
+    double value = 0;
+    if (std::from_chars(whole, end, value).ec == std::errc::result_out_of_range)
+        return false;
+    while (wholeEnd - whole > 1 && *whole == '0')
+        ++whole;
+    out.append(isNegative ? "-" : "").append(whole == wholeEnd ? "0" : "");
+    out.append(whole, static_cast<int>(wholeEnd - whole));
+    if (fraction != fractionEnd)
+        out.append('.').append(fraction, static_cast<int>(fractionEnd - fraction));
+    if (hasExponent)
+        out.append(*fractionEnd)
+            .append(isSmall ? "-" : "")
+            .append(exponent, static_cast<int>(end - exponent));
+    return true;
+}
+
+/// What is no number is a text.
+void appendDecimals(QByteArray& out, DcmElement& element)
+{
+    appendOpening(out, element.getTag(), "DS");
+    const unsigned long count = element.isEmpty() ? 0 : element.getVM();
+    for (unsigned long i = 0; i < count; ++i) {
+        OFString text;
+        element.getOFString(text, i);
+        out.append(i == 0 ? R"(,"Value":[)" : ",");
+        if (text.empty()) {
+            out.append("null");
+        } else if (!appendNumber(out, text.c_str(), text.c_str() + text.size())) {
+            std::ostringstream quoted;
+            DcmJsonFormat::printString(quoted, text);
+            out.append(quoted.str().c_str());
+        }
+    }
+    out.append(count == 0 ? "}" : "]}");
+}
+
 }  // namespace
 
 const JsonForm& JsonForm::instance()
@@ -253,6 +312,10 @@ bool JsonForm::plainValue(QByteArray& out, const DcmTagKey& key, VrCode vr, cons
 
 void JsonForm::element(QByteArray& out, DcmElement& element, const char* /*creator*/) const
 {
+    if (element.ident() == EVR_DS) {
+        appendDecimals(out, element);
+        return;
+    }
     DcmJsonFormatCompact format(OFFalse);
     std::ostringstream text;
     element.writeJson(text, format);

@@ -105,6 +105,8 @@ unsigned int TextConversion::convert(DcmElement& element, const QByteArray& char
     case Way::Each:
         return convertValueToUtf8(element, characterSet) ? kChanged : 0;
     case Way::AsStored:
+        // Nothing that was looked at is changed by it, but the declaration itself was not looked at so far.
+        convertValueToUtf8(element, characterSet);
         return 0;
     }
     return 0;

@@ -72,7 +72,10 @@ bool decodeByDeclaration(const QByteArray& bytes, const QByteArray& characterSet
     if (!tSelected.select(characterSet))
         return false;
     // One that met what it cannot convert is used no further: it may stand in the middle of a text.
-    tSelected.isGood = tSelected.converter.convertString(bytes.constData(), converted, kDelimiters).good();
+    tSelected.isGood =
+        tSelected.converter
+            .convertString(bytes.constData(), static_cast<size_t>(bytes.size()), converted, kDelimiters)
+            .good();
     return tSelected.isGood && decodeWith("UTF-8", QByteArray::fromStdString(converted), text);
 }
 
@@ -242,14 +245,18 @@ bool convertValuesToUtf8(DcmItem& dataset)
 bool convertValueToUtf8(DcmElement& element, const QByteArray& characterSet)
 {
     char* text = nullptr;
-    if (!DcmVR(element.getVR()).isaString() || element.getString(text).bad() || text == nullptr)
+    Uint32 length = 0;
+    if (!DcmVR(element.getVR()).isaString() || element.getString(text, length).bad() || text == nullptr)
         return false;
-    const QByteArray bytes(text);
+    // With what stands behind a NUL, which not all forms end at.
+    const QByteArray bytes(text, static_cast<int>(length));
     // Codes and dates are ASCII whatever is declared.
     if (isText(bytes, element.isAffectedBySpecificCharacterSet() ? characterSet : QByteArray()))
         return false;
     const QByteArray converted = decodeText(bytes, characterSet).toUtf8();
-    element.putString(converted.constData());
+    // Of the base class, for a UID would be looked for by its name behind "=".
+    static_cast<DcmByteString&>(element).DcmByteString::putString(converted.constData(),
+                                                                  static_cast<Uint32>(converted.size()));
     return converted != bytes;
 }
 
