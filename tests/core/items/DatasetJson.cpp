@@ -9,6 +9,8 @@
 #include <dcmtk/dcmdata/dcjson.h>
 #include <dcmtk/dcmdata/dctk.h>
 
+#include <cstdio>
+#include <cstdlib>
 #include <memory>
 #include <sstream>
 
@@ -139,6 +141,29 @@ std::string datasetJson(const TagMap& map, const std::string& bulkDataRoot, Json
     std::ostringstream out;
     JsonWriter(out, entries).object(*utf8Dataset(map), map, bulkDataRoot);
     return out.str();
+}
+
+std::string withRoundedReals(const std::string& json)
+{
+    const std::string opening = R"("vr":"FD","Value":[)";
+    std::string rounded;
+    std::size_t at = 0;
+    for (std::size_t found = json.find(opening); found != std::string::npos; found = json.find(opening, at)) {
+        rounded.append(json, at, found + opening.size() - at);
+        at = found + opening.size();
+        while (json.at(at) != ']') {
+            char* end = nullptr;
+            char digits[32];
+            const double value = std::strtod(json.c_str() + at, &end);
+            std::snprintf(digits, sizeof digits, "%.10g", value == 0 ? 0 : value);
+            const std::size_t next = json.find_first_of(",]", at);
+            // What is no number stays as it is.
+            rounded += end == json.c_str() + next ? digits : json.substr(at, next - at);
+            at = next + (json.at(next) == ',' ? 1 : 0);
+            rounded += json.at(next) == ',' ? "," : "";
+        }
+    }
+    return rounded + json.substr(at);
 }
 
 }  // namespace Kdd

@@ -26,14 +26,14 @@ namespace
 
 std::string expected(const TagMap& map, bool own = false)
 {
-    return datasetJson(map, "a\"b", own ? JsonEntries::Own : JsonEntries::Merged);
+    return withRoundedReals(datasetJson(map, "a\"b", own ? JsonEntries::Own : JsonEntries::Merged));
 }
 
 std::string written(const TagMap& map, bool own = false)
 {
     std::ostringstream out;
     (own ? writeOwnDicomJson : writeDicomJson)(out, map, "a\"b");
-    return out.str();
+    return withRoundedReals(out.str());
 }
 
 const DcmTagKey kCreator(0x0009, 0x0010), kPrivate(0x0009, 0x1001), kRetired(0x0008, 0x0001);
@@ -199,7 +199,8 @@ TEST(ImageWriter, EqualsTheWayByDatasetsForRandomTrees)
         for (const TagMap* image : file->imagesByUID()) {
             QByteArray text("before");
             writer.append(text, *image, "a\"b");
-            EXPECT_EQ(text.toStdString(), "before" + expected(*image)) << seed << (++different, "");
+            EXPECT_EQ(withRoundedReals(text.toStdString()), "before" + expected(*image))
+                << seed << (++different, "");
             EXPECT_EQ(written(*image, true), expected(*image, true)) << seed << (++different, "");
         }
         for (const TagMap* series : file->seriesByUID())

@@ -92,7 +92,8 @@ TEST_F(ProcessFaults, AFullDiskKeepsNoAnswersAndGivesThemAll)
     serve({}, "trap '' XFSZ; ulimit -f 1;");
     for (int i = 0; i < 3; ++i) {
         const Reply reply = get("studies/1.2/metadata", kGzip);
-        EXPECT_TRUE(reply.isWhole && reply.body == kept.body);
+        EXPECT_TRUE(reply.isWhole && reply.body == kept.body)
+            << i << ' ' << reply.head.constData() << reply.body.size() << " of " << kept.body.size();
         EXPECT_EQ(reply.header("ETag"), kept.header("ETag"));
     }
     EXPECT_EQ(keptAnswers(), QStringList());

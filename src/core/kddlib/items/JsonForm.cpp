@@ -1,5 +1,6 @@
 #include "kddlib/items/JsonForm.h"
 
+#include "kddlib/items/RealText.h"
 #include "kddlib/tagmodel/VrCode.h"
 
 #include <QtEndian>
@@ -22,6 +23,8 @@ namespace Kdd
 
 namespace
 {
+
+using Kdd::realText;
 
 // As DCMTK writes them; what is not listed has no short way.
 constexpr const char* kTextNames[] = {"AE",    "AS",    nullptr, "CS",    "DA",    "DS",    "DT",    nullptr,
@@ -185,13 +188,23 @@ bool plainNumbers(QByteArray& out, const DcmTagKey& key, const char* vr, const Q
     return true;
 }
 
-/// With as many digits as DCMTK gives. JSON has no number for what is not finite, so that is a string which programs take for
-/// one. Bytes behind the last whole value are no value.
+/// With as many digits as DCMTK gives a float.
+QByteArray realText(float value)
+{
+    char digits[64];
+    OFStandard::ftoa(digits, sizeof digits, static_cast<double>(value), 0, 0,
+                     std::numeric_limits<float>::max_digits10);
+    OFString number(digits);
+    DcmJsonFormat::normalizeDecimalString(number);
+    return number.c_str();
+}
+
+/// JSON has no number for what is not finite, so that is a string which programs take for one. Bytes behind the last whole
+/// value are no value.
 template <typename Real>
 bool plainReals(QByteArray& out, const DcmTagKey& key, const char* vr, const QByteArray& bytes)
 {
     constexpr int kSize = sizeof(Real);
-    constexpr int kDigits = std::numeric_limits<Real>::max_digits10;
     appendOpening(out, key, vr);
     const int end = bytes.size() - bytes.size() % kSize;
     for (int at = 0; at < end; at += kSize) {
@@ -202,11 +215,7 @@ bool plainReals(QByteArray& out, const DcmTagKey& key, const char* vr, const QBy
             out.append(std::isnan(value) ? R"("NaN")" : value > 0 ? R"("Infinity")" : R"("-Infinity")");
             continue;
         }
-        char digits[64];
-        OFStandard::ftoa(digits, sizeof digits, static_cast<double>(value), 0, 0, kDigits);
-        OFString number(digits);
-        DcmJsonFormat::normalizeDecimalString(number);
-        out.append(number.c_str());
+        out.append(realText(value));
     }
     out.append(end == 0 ? "}" : "]}");
     return true;

@@ -1,5 +1,6 @@
 #include "kddlib/items/NativeModelForm.h"
 
+#include "kddlib/items/RealText.h"
 #include "kddlib/tagmodel/AttributeNames.h"
 
 #include <QList>
@@ -8,6 +9,7 @@
 #include <dcmtk/dcmdata/dcelem.h>
 #include <dcmtk/dcmdata/dctag.h>
 
+#include <cmath>
 #include <iterator>
 
 namespace Kdd
@@ -123,7 +125,10 @@ void appendValues(QByteArray& out, DcmElement& element)
 {
     OFString text;
     for (unsigned long i = 0; i < element.getVM() && element.getOFString(text, i).good(); ++i) {
-        const QByteArray value = bytesOf(text);
+        Float64 real = 0;
+        const bool isReal =
+            element.getVR() == EVR_FD && element.getFloat64(real, i).good() && std::isfinite(real);
+        const QByteArray value = isReal ? realText(real) : bytesOf(text);
         if (element.getVR() == EVR_PN)
             appendNumbered(out, "PersonName", i + 1, personName(value));
         else if (element.getVR() == EVR_AT)
