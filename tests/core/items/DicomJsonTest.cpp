@@ -148,9 +148,12 @@ TEST(DicomJson, HasTheVeryNumbersOfDoubles)
         TagMap map;
         map.putElement(DCM_PatientWeight,
                        new TagElement(VrCode::FD, {reinterpret_cast<const char*>(&value), 8}));
+        QByteArray xml;
+        DicomImageWriter(MetadataForm::Xml).append(xml, map, "");
         const std::string json = jsonOf(map);
-        const std::size_t at = json.rfind('[') + 1;
-        ASSERT_EQ(std::strtod(json.c_str() + at, nullptr), value) << json;
+        const QByteArray opening = R"(<Value number="1">)";
+        ASSERT_EQ(std::strtod(json.c_str() + json.rfind('[') + 1, nullptr), value) << json;
+        ASSERT_EQ(std::strtod(xml.constData() + xml.lastIndexOf(opening) + opening.size(), nullptr), value);
     }
 }
 
