@@ -107,8 +107,6 @@ protected:
         return move(onLevel("STUDY", "StudyInstanceUID=" + uid), options, to);
     }
 
-    using SearchedArchive::get;
-
     /// The dataset of an object as it is retrieved over HTTP, as stored.
     QByteArray retrieved(const QByteArray& path) const
     {
