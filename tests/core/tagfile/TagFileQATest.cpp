@@ -314,5 +314,20 @@ TEST_F(TagFileQA, AMoveThatEndedBetweenTheTwoWritesKeepsWhatWasEditedMeanwhile)
               "The tag file of study 9 cannot be changed: others hold it");
 }
 
+TEST_F(TagFileQA, AMoveRenewsTheLabelsOfBothStudies)
+{
+    TagFile file;
+    for (const char* series : {"5.1", "5.2"}) {
+        const DatasetBuilder image = anImage(series).inStudy("5").inSeries(series).with(DCM_Modality, "CT");
+        file.addTagMap(image.map(), nullptr, true);
+    }
+    file.createAbstractTags();
+    ASSERT_TRUE(file.writeCacheFile());
+    EXPECT_EQ(value("5", "5.2", kAbstract), "CT (2)");
+    correct(move({"5.1"}, "5", "6"));
+    EXPECT_EQ(value("5", "5.2", kAbstract), "CT") << "it has to be told apart from none";
+    EXPECT_EQ(value("6", "5.1", kAbstract), "CT");
+}
+
 }  // namespace
 }  // namespace Kdd
