@@ -233,6 +233,15 @@ bool plainUnknown(QByteArray& out, const DcmTagKey& key, const QByteArray& bytes
     return true;
 }
 
+/// Moves past the letter of an exponent and the sign behind it, where there is one. Whether it is negative.
+bool skipExponentSign(const char*& at, const char* end)
+{
+    if (at == end || (*at != 'e' && *at != 'E'))
+        return false;
+    ++at;
+    return at != end && (*at == '-' || *at == '+') && *at++ == '-';
+}
+
 /// Appends a number of DICOM in the form that JSON has for it: no zeros in front, digits on both sides of the point, and no "+".
 /// False, with nothing appended, when it is none, or none that readers can hold. DCMTK leaves the point of "1." and makes "e3"
 /// of "0e3".
@@ -247,11 +256,8 @@ bool appendNumber(QByteArray& out, const char* at, const char* end)
     if (whole == wholeEnd && fraction == fractionEnd)
         return false;
     const char* exponent = fractionEnd;
-    bool isSmall = false;  // the exponent is negative
-    const bool hasExponent = exponent != end && (*exponent == 'e' || *exponent == 'E');
-    if (hasExponent && ++exponent != end && (*exponent == '-' || *exponent == '+'))
-        isSmall = *exponent++ == '-';
-    if (skipDigits(exponent, end) != end || (hasExponent && exponent == end))
+    const bool isSmall = skipExponentSign(exponent, end);
+    if (skipDigits(exponent, end) != end || (exponent != fractionEnd && exponent == end))
         return false;
     double value = 0;
     if (std::from_chars(whole, end, value).ec == std::errc::result_out_of_range)
@@ -262,7 +268,7 @@ bool appendNumber(QByteArray& out, const char* at, const char* end)
     out.append(whole, static_cast<int>(wholeEnd - whole));
     if (fraction != fractionEnd)
         out.append('.').append(fraction, static_cast<int>(fractionEnd - fraction));
-    if (hasExponent)
+    if (exponent != fractionEnd)
         out.append(*fractionEnd)
             .append(isSmall ? "-" : "")
             .append(exponent, static_cast<int>(end - exponent));

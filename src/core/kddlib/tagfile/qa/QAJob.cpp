@@ -70,7 +70,7 @@ QAJob::~QAJob()
 
 Result QAJob::run()
 {
-    const Result result = attempt();
+    Result result = attempt();
     if (result.bad() && mJob.outcome.fault == ChangeFault::None)
         mJob.outcome.fault = ChangeFault::Failed;
     return result;
