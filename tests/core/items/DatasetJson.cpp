@@ -9,8 +9,7 @@
 #include <dcmtk/dcmdata/dcjson.h>
 #include <dcmtk/dcmdata/dctk.h>
 
-#include <cstdio>
-#include <cstdlib>
+#include <charconv>
 #include <memory>
 #include <sstream>
 
@@ -152,13 +151,15 @@ std::string withRoundedReals(const std::string& json)
         rounded.append(json, at, found + opening.size() - at);
         at = found + opening.size();
         while (json.at(at) != ']') {
-            char* end = nullptr;
-            char digits[32];
-            const double value = std::strtod(json.c_str() + at, &end);
-            std::snprintf(digits, sizeof digits, "%.10g", value == 0 ? 0 : value);
             const std::size_t next = json.find_first_of(",]", at);
+            const char* const end = json.data() + next;
+            double value = 0;
+            char digits[32];
+            const bool isNumber = std::from_chars(json.data() + at, end, value).ptr == end;
+            const auto written = std::to_chars(digits, digits + sizeof digits, value == 0 ? 0 : value,
+                                               std::chars_format::general, 10);
             // What is no number stays as it is.
-            rounded += end == json.c_str() + next ? digits : json.substr(at, next - at);
+            rounded += isNumber ? std::string(digits, written.ptr) : json.substr(at, next - at);
             at = next + (json.at(next) == ',' ? 1 : 0);
             rounded += json.at(next) == ',' ? "," : "";
         }

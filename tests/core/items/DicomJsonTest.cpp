@@ -15,7 +15,9 @@
 #include <gtest/gtest.h>
 
 #include <array>
+#include <charconv>
 #include <cmath>
+#include <cstring>
 #include <memory>
 #include <random>
 #include <sstream>
@@ -138,6 +140,14 @@ TEST(DicomJson, HasWordsForWhatIsNoNumber)
                                    R"("00101030":{"vr":"FD","Value":[1.5,"NaN","Infinity","-Infinity"]}})"));
 }
 
+/// In every locale.
+double numberAt(const char* text)
+{
+    double value = 0;
+    std::from_chars(text, text + std::strlen(text), value);
+    return value;
+}
+
 TEST(DicomJson, HasTheVeryNumbersOfDoubles)
 {
     std::mt19937_64 random(1);
@@ -152,8 +162,8 @@ TEST(DicomJson, HasTheVeryNumbersOfDoubles)
         DicomImageWriter(MetadataForm::Xml).append(xml, map, "");
         const std::string json = jsonOf(map);
         const QByteArray opening = R"(<Value number="1">)";
-        ASSERT_EQ(std::strtod(json.c_str() + json.rfind('[') + 1, nullptr), value) << json;
-        ASSERT_EQ(std::strtod(xml.constData() + xml.lastIndexOf(opening) + opening.size(), nullptr), value);
+        ASSERT_EQ(numberAt(json.c_str() + json.rfind('[') + 1), value) << json;
+        ASSERT_EQ(numberAt(xml.constData() + xml.lastIndexOf(opening) + opening.size()), value);
     }
 }
 
