@@ -55,7 +55,7 @@ public:
     /// as they were then: told in the log.
     virtual bool isDamaged(const QByteArray& studyUID, const Kxg::TagFileStamp& read) = 0;
 
-    /// Why there is no tag file: `Absent`, `Unbuilt` or `Missing`.
+    /// Why there is no tag file: `Absent`, `Unbuilt`, or `Missing`, which is told in the log.
     virtual Presence whyAbsent(const QByteArray& studyUID) = 0;
 };
 

@@ -14,7 +14,6 @@
 #include <algorithm>
 #include <charconv>
 #include <cmath>
-#include <cstring>
 #include <limits>
 #include <sstream>
 
@@ -23,8 +22,6 @@ namespace Kdd
 
 namespace
 {
-
-using Kdd::realText;
 
 // As DCMTK writes them; what is not listed has no short way.
 constexpr const char* kTextNames[] = {"AE",    "AS",    nullptr, "CS",    "DA",    "DS",    "DT",    nullptr,
@@ -90,7 +87,7 @@ bool isPlainInteger(const char* begin, const char* end)
 
 bool isPlainDecimal(const char* begin, const char* end)
 {
-    // That of most digits that a double can be.
+    // With more digits it may be beyond every double.
     if (end - begin > std::numeric_limits<double>::max_exponent10)
         return false;
     const char* at = pastInteger(begin, end);
@@ -188,37 +185,23 @@ bool plainNumbers(QByteArray& out, const DcmTagKey& key, const char* vr, const Q
     return true;
 }
 
-/// With as many digits as DCMTK gives a float.
-QByteArray realText(float value)
-{
-    char digits[64];
-    OFStandard::ftoa(digits, sizeof digits, static_cast<double>(value), 0, 0,
-                     std::numeric_limits<float>::max_digits10);
-    OFString number(digits);
-    DcmJsonFormat::normalizeDecimalString(number);
-    return number.c_str();
-}
-
 /// JSON has no number for what is not finite, so that is a string which programs take for one. Bytes behind the last whole
 /// value are no value.
 template <typename Real>
-bool plainReals(QByteArray& out, const DcmTagKey& key, const char* vr, const QByteArray& bytes)
+void appendReals(QByteArray& out, const DcmTagKey& key, const char* vr, const QByteArray& bytes)
 {
     constexpr int kSize = sizeof(Real);
     appendOpening(out, key, vr);
     const int end = bytes.size() - bytes.size() % kSize;
     for (int at = 0; at < end; at += kSize) {
-        Real value = 0;
-        std::memcpy(&value, bytes.constData() + at, kSize);
+        const auto value = qFromUnaligned<Real>(bytes.constData() + at);
         out.append(at == 0 ? R"(,"Value":[)" : ",");
-        if (!std::isfinite(value)) {
+        if (std::isfinite(value))
+            appendReal(out, value);
+        else
             out.append(std::isnan(value) ? R"("NaN")" : value > 0 ? R"("Infinity")" : R"("-Infinity")");
-            continue;
-        }
-        out.append(realText(value));
     }
     out.append(end == 0 ? "}" : "]}");
-    return true;
 }
 
 /// A private value of unknown kind. One of odd length would be padded, and a standard attribute may be of a younger VR.
@@ -307,9 +290,11 @@ bool JsonForm::plainValue(QByteArray& out, const DcmTagKey& key, VrCode vr, cons
 {
     switch (vr) {
     case VrCode::FD:
-        return plainReals<double>(out, key, "FD", bytes);
+        appendReals<double>(out, key, "FD", bytes);
+        return true;
     case VrCode::FL:
-        return plainReals<float>(out, key, "FL", bytes);
+        appendReals<float>(out, key, "FL", bytes);
+        return true;
     case VrCode::UN:
         return plainUnknown(out, key, bytes);
     case VrCode::SL:

@@ -128,7 +128,11 @@ void appendValues(QByteArray& out, DcmElement& element)
         Float64 real = 0;
         const bool isReal =
             element.getVR() == EVR_FD && element.getFloat64(real, i).good() && std::isfinite(real);
-        const QByteArray value = isReal ? realText(real) : bytesOf(text);
+        QByteArray value;
+        if (isReal)
+            appendReal(value, real);
+        else
+            value = bytesOf(text);
         if (element.getVR() == EVR_PN)
             appendNumbered(out, "PersonName", i + 1, personName(value));
         else if (element.getVR() == EVR_AT)

@@ -63,11 +63,11 @@ Http::Response RemovalResource::remove(const Http::Request& request, const Resou
     LogFile::errorf("Request %s: %s removed of study %s: %s", request.id.constData(),
                     isKept ? "not all is yet" : "nothing is", path.study.constData(),
                     qUtf8Printable(asked.text()));
-    if (isKept && mStudies.arrivals() != nullptr)
+    if (!isKept)
+        return Http::failure(500, QStringLiteral("It could not be removed; the server's log tells why"));
+    if (mStudies.arrivals() != nullptr)
         mStudies.arrivals()->takeOver(path.study);
-    if (isKept)
-        return removed(path.study, removal.images, true);
-    return Http::failure(500, QStringLiteral("It could not be removed; the server's log tells why"));
+    return removed(path.study, removal.images, true);
 }
 
 }  // namespace Kdd::DicomWeb
