@@ -10,8 +10,11 @@
 #include <dcmtk/dcmdata/dctk.h>
 
 #include <charconv>
+#include <limits>
 #include <memory>
+#include <regex>
 #include <sstream>
+#include <type_traits>
 
 namespace Kdd
 {
@@ -133,6 +136,41 @@ private:
     DcmJsonFormatCompact mFormat;
 };
 
+template <typename Real>
+std::string comparableReal(Real value)
+{
+    // As certain as DCMTK gives them.
+    constexpr int kDigits = std::is_same_v<Real, float> ? std::numeric_limits<float>::max_digits10 : 10;
+    char digits[32];
+    const auto written = std::to_chars(digits, digits + sizeof digits, value == 0 ? 0 : value,
+                                       std::chars_format::general, kDigits);
+    return {digits, written.ptr};
+}
+
+template <typename Real>
+std::string withReals(const std::string& json)
+{
+    const std::string opening =
+        std::is_same_v<Real, float> ? R"("vr":"FL","Value":[)" : R"("vr":"FD","Value":[)";
+    std::string written;
+    std::size_t at = 0;
+    for (std::size_t found = json.find(opening); found != std::string::npos; found = json.find(opening, at)) {
+        written.append(json, at, found + opening.size() - at);
+        at = found + opening.size();
+        while (json.at(at) != ']') {
+            const std::size_t next = json.find_first_of(",]", at);
+            const char* const end = json.data() + next;
+            Real value = 0;
+            // What is no number stays as it is.
+            const bool isNumber = std::from_chars(json.data() + at, end, value).ptr == end;
+            written += isNumber ? comparableReal(value) : json.substr(at, next - at);
+            at = next + (json.at(next) == ',' ? 1 : 0);
+            written += json.at(next) == ',' ? "," : "";
+        }
+    }
+    return written + json.substr(at);
+}
+
 }  // namespace
 
 std::string datasetJson(const TagMap& map, const std::string& bulkDataRoot, JsonEntries entries)
@@ -142,29 +180,10 @@ std::string datasetJson(const TagMap& map, const std::string& bulkDataRoot, Json
     return out.str();
 }
 
-std::string withRoundedReals(const std::string& json)
+std::string comparable(const std::string& json)
 {
-    const std::string opening = R"("vr":"FD","Value":[)";
-    std::string rounded;
-    std::size_t at = 0;
-    for (std::size_t found = json.find(opening); found != std::string::npos; found = json.find(opening, at)) {
-        rounded.append(json, at, found + opening.size() - at);
-        at = found + opening.size();
-        while (json.at(at) != ']') {
-            const std::size_t next = json.find_first_of(",]", at);
-            const char* const end = json.data() + next;
-            double value = 0;
-            char digits[32];
-            const bool isNumber = std::from_chars(json.data() + at, end, value).ptr == end;
-            const auto written = std::to_chars(digits, digits + sizeof digits, value == 0 ? 0 : value,
-                                               std::chars_format::general, 10);
-            // What is no number stays as it is.
-            rounded += isNumber ? std::string(digits, written.ptr) : json.substr(at, next - at);
-            at = next + (json.at(next) == ',' ? 1 : 0);
-            rounded += json.at(next) == ',' ? "," : "";
-        }
-    }
-    return rounded + json.substr(at);
+    static const std::regex kNoValues(R"re(,"Value":\[null(,null)*\])re");
+    return withReals<float>(withReals<double>(std::regex_replace(json, kNoValues, "")));
 }
 
 }  // namespace Kdd

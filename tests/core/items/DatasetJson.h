@@ -13,7 +13,7 @@ enum class JsonEntries { Merged, Own };
 /// and what the library's own writer is held against.
 std::string datasetJson(const TagMap& map, const std::string& bulkDataRoot, JsonEntries entries);
 
-/// With the numbers of VR FD to 10 digits and zero without its sign, as certain as DCMTK gives them.
-std::string withRoundedReals(const std::string& json);
+/// Without what DCMTK does otherwise: reals with other digits, zero without its sign, and lists of nothing but empty values.
+std::string comparable(const std::string& json);
 
 }  // namespace Kdd

@@ -26,14 +26,14 @@ namespace
 
 std::string expected(const TagMap& map, bool own = false)
 {
-    return withRoundedReals(datasetJson(map, "a\"b", own ? JsonEntries::Own : JsonEntries::Merged));
+    return comparable(datasetJson(map, "a\"b", own ? JsonEntries::Own : JsonEntries::Merged));
 }
 
 std::string written(const TagMap& map, bool own = false)
 {
     std::ostringstream out;
     (own ? writeOwnDicomJson : writeDicomJson)(out, map, "a\"b");
-    return withRoundedReals(out.str());
+    return comparable(out.str());
 }
 
 const DcmTagKey kCreator(0x0009, 0x0010), kPrivate(0x0009, 0x1001), kRetired(0x0008, 0x0001);
@@ -105,7 +105,7 @@ private:
         static const QList<QByteArray> kPlain =
             QByteArray(
                 R"(|A|A\B|A\|A\B\\C|1\\2|\|a  |  a|~|say "x"|19990101|Doe^John|Doe^J=X^Y=Z|^|A^|=|A==B)"
-                R"(|=PatientRootQuery|12|-1.5|007|+3|1e3|1E-3|.5| 5 |-0|--1|-|0.0|00.5|1.2.840|1.2 .3)")
+                R"(|   |A=B=C|^A^^=^B |12|-1.5|007|+3|1e3|1E-3|.5| 5 |-0|--1|-|0.0|00.5|1.2.840|1.2 .3)")
                 .split('|');
         static const char* const kEncoded[] = {
             "M\xfcller",   "M\xc3\xbcller", "M\xfc\\N\xf6^x",   "\xbb\xee\xda", "\x1b$B;3ED\x1b(B",
@@ -162,7 +162,11 @@ private:
     {
         for (int count = below(12); count > 0; --count) {
             const VrCode code = vr();
-            map.putElement(oneOf(kKeys), new TagElement(code, isTextVr(code) ? text() : bytes()));
+            QByteArray value = isTextVr(code) ? text() : bytes();
+            // DCMTK takes that for the name of a UID.
+            if (code == VrCode::UI && value.startsWith('='))
+                value.clear();
+            map.putElement(oneOf(kKeys), new TagElement(code, value));
         }
         for (int count = below(3); count > 0; --count)
             map.putElement(oneOf(kKeys), new TagElement(VrCode::LO, text()));
@@ -199,7 +203,7 @@ TEST(ImageWriter, EqualsTheWayByDatasetsForRandomTrees)
         for (const TagMap* image : file->imagesByUID()) {
             QByteArray text("before");
             writer.append(text, *image, "a\"b");
-            EXPECT_EQ(withRoundedReals(text.toStdString()), "before" + expected(*image))
+            EXPECT_EQ(comparable(text.toStdString()), "before" + expected(*image))
                 << seed << (++different, "");
             EXPECT_EQ(written(*image, true), expected(*image, true)) << seed << (++different, "");
         }

@@ -1,10 +1,10 @@
 #pragma once
 
-#include "kddlib/tagmodel/VrCode.h"
-
 #include <QByteArray>
 
-class DcmElement;
+#include <array>
+#include <string_view>
+
 class DcmTagKey;
 
 namespace Kdd
@@ -17,6 +17,10 @@ struct AttributeName
     const char* creator;  ///< of a private one, where the form shows it; may be null, and else is
 };
 
+/// The alphabetic, the ideographic and the phonetic form of a person's name, without the spaces and the separators of
+/// components that pad them.
+using NameGroups = std::array<std::string_view, 3>;
+
 /// A way of writing down attributes, each for itself, so that what images share is written once and copied. Everything is
 /// appended to `out`, in UTF-8. Without state.
 class AttributeForm
@@ -24,20 +28,30 @@ class AttributeForm
 public:
     virtual ~AttributeForm() = default;
 
-    /// A value of nothing but printable ASCII, or of numbers, straight from its bytes. False, and nothing written, when
-    /// the form has no short way for such a value; then it is written by `element`.
-    virtual bool plainValue(QByteArray& out, const DcmTagKey& key, VrCode vr,
-                            const QByteArray& bytes) const = 0;
-
     /// Whether private attributes are written with their creator.
     virtual bool showsCreators() const = 0;
 
-    /// Any value. The element is not changed, though DCMTK needs it to be changeable.
-    virtual void element(QByteArray& out, DcmElement& element, const char* creator) const = 0;
+    /// An attribute that is no sequence: between the two come its values, `count` of them. `vr` is one of the standard.
+    virtual void beginValues(QByteArray& out, const AttributeName& name, const char* vr) const = 0;
+    virtual void endValues(QByteArray& out, int count) const = 0;
 
-    /// A value that is elsewhere: between the two comes its address.
-    virtual void beginOmitted(QByteArray& out, const AttributeName& name) const = 0;
-    virtual void endOmitted(QByteArray& out) const = 0;
+    /// Value `index`, from 0, which may be empty; then the VR decides what that is written as.
+    virtual void text(QByteArray& out, int index, std::string_view text) const = 0;
+
+    virtual void name(QByteArray& out, int index, const NameGroups& groups) const = 0;
+
+    /// A text that should be a number. Whether it is one has to be seen.
+    virtual void numeral(QByteArray& out, int index, std::string_view text) const = 0;
+
+    /// A number, by the digits that read back as it.
+    virtual void number(QByteArray& out, int index, std::string_view digits) const = 0;
+
+    /// Bytes, at least one, that are a value as a whole.
+    virtual void binary(QByteArray& out, const QByteArray& bytes) const = 0;
+
+    /// In place of values that are elsewhere: between the two comes their address.
+    virtual void beginAddress(QByteArray& out) const = 0;
+    virtual void endAddress(QByteArray& out) const = 0;
 
     /// A text as a part of that address.
     virtual QByteArray addressPart(const QByteArray& text) const = 0;

@@ -1,11 +1,12 @@
 #include "kddlib/items/ImageWriter.h"
 
+#include "kddlib/items/AttributeValues.h"
+#include "kddlib/items/KeyDigits.h"
 #include "kddlib/tagmodel/TagElement.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "kddlib/tagmodel/TagSequence.h"
 
 #include <dcmtk/dcmdata/dcdeftag.h>
-#include <dcmtk/dcmdata/dcelem.h>
 
 #include <algorithm>
 #include <utility>
@@ -20,26 +21,24 @@ constexpr Uint16 kOwnGroup = 0x0006;
 
 using Way = TextConversion::Way;
 
-QByteArray hexOf(const DcmTagKey& key)
-{
-    const char* const digits = "0123456789ABCDEF";
-    const unsigned int number = (static_cast<unsigned int>(key.getGroup()) << 16) | key.getElement();
-    QByteArray hex(8, Qt::Uninitialized);
-    for (int i = 0; i < 8; ++i)
-        hex[i] = digits[(number >> (28 - 4 * i)) & 15];
-    return hex;
-}
-
 bool isAsciiText(const QByteArray& bytes)
 {
     return std::all_of(bytes.begin(), bytes.end(), [](char c) { return c >= ' ' && c <= '~'; });
 }
 
-/// VRs whose texts are in the declared character set.
-bool isInCharacterSet(VrCode vr)
+/// Others are markers, or nothing that an attribute of a file can be.
+bool hasValues(VrCode code)
 {
-    return vr == VrCode::LO || vr == VrCode::LT || vr == VrCode::PN || vr == VrCode::SH || vr == VrCode::ST ||
-           vr == VrCode::UT;
+    switch (code) {
+    case VrCode::Lt:
+    case VrCode::Ox:
+    case VrCode::UN:
+    case VrCode::Up:
+    case VrCode::Xs:
+        return true;
+    default:
+        return code <= VrCode::UT && code != VrCode::SQ;
+    }
 }
 
 /// Calls `visit(key, element)` for what a node shows, or for what it holds itself.
@@ -248,37 +247,37 @@ void ImageWriter::attribute(Target& target, const TagMap& node, const DcmTagKey&
 void ImageWriter::value(Target& target, const AttributeName& name, const TagElement& element,
                         const Place& place)
 {
-    const bool isText = isTextVr(element.vr());
-    const bool isKept =
-        !isText || (isAsciiText(element.value()) &&
-                    (!isInCharacterSet(element.vr()) || mConversion->keepsAscii(place.characterSet)));
-    if (isKept && mForm.plainValue(target.text, name.key, element.vr(), element.value()))
+    if (!hasValues(element.vr()))
         return;
-    // What is seldom met goes the way of DCMTK, by itself.
-    const std::unique_ptr<DcmElement> rebuilt(element.createDcmElement(name.key));
-    if (rebuilt == nullptr)
-        return;
-    if (isText)
-        target.findings |= mConversion->convert(*rebuilt, place.characterSet);
-    mForm.element(target.text, *rebuilt, name.creator);
+    const DcmEVR vr = evrOf(element.vr(), name.key);
+    const bool isKept = !isTextVr(element.vr()) ||
+                        (isAsciiText(element.value()) &&
+                         (!TextConversion::concerns(vr) || mConversion->keepsAscii(place.characterSet)));
+    QByteArray value = element.value();
+    if (!isKept)
+        target.findings |= mConversion->convert(value, vr, place.characterSet);
+    appendAttribute(target.text, mForm, name, vr, value);
 }
 
 void ImageWriter::omitted(Target& target, const AttributeName& name, const Place& place) const
 {
-    mForm.beginOmitted(target.text, name);
+    // The value's own VR went with it.
+    mForm.beginValues(target.text, name, DcmVR(dictionaryEvr(name.key)).getValidVRName());
+    mForm.beginAddress(target.text);
     if (target.root != nullptr)
         target.text.append(*target.root);
     else
         target.record->holes.append(target.text.size());
-    target.text.append(place.path).append('/').append(hexOf(name.key));
-    mForm.endOmitted(target.text);
+    target.text.append(place.path).append('/').append(keyDigits(name.key));
+    mForm.endAddress(target.text);
+    mForm.endValues(target.text, 0);
 }
 
 void ImageWriter::sequence(Target& target, const AttributeName& name, const TagSequence& sequence,
                            const Place& place)
 {
     mForm.beginSequence(target.text, name);
-    const QByteArray path = place.path + '/' + hexOf(name.key) + '/';
+    const QByteArray path = place.path + '/' + keyDigits(name.key) + '/';
     for (int i = 0; i < sequence.numItems(); ++i) {
         const TagMap& item = sequence.itemToRead(i);
         mForm.beginItem(target.text, i);

@@ -11,11 +11,16 @@ class NativeModelForm : public AttributeForm
 public:
     static const NativeModelForm& instance();
 
-    bool plainValue(QByteArray& out, const DcmTagKey& key, VrCode vr, const QByteArray& bytes) const override;
     bool showsCreators() const override { return true; }
-    void element(QByteArray& out, DcmElement& element, const char* creator) const override;
-    void beginOmitted(QByteArray& out, const AttributeName& name) const override;
-    void endOmitted(QByteArray& out) const override;
+    void beginValues(QByteArray& out, const AttributeName& name, const char* vr) const override;
+    void endValues(QByteArray& out, int count) const override;
+    void text(QByteArray& out, int index, std::string_view text) const override;
+    void name(QByteArray& out, int index, const NameGroups& groups) const override;
+    void numeral(QByteArray& out, int index, std::string_view text) const override;
+    void number(QByteArray& out, int index, std::string_view digits) const override;
+    void binary(QByteArray& out, const QByteArray& bytes) const override;
+    void beginAddress(QByteArray& out) const override;
+    void endAddress(QByteArray& out) const override;
     QByteArray addressPart(const QByteArray& text) const override;
     void beginSequence(QByteArray& out, const AttributeName& name) const override;
     void endSequence(QByteArray& out, int items) const override;

@@ -28,6 +28,21 @@ QByteArray declaredBy(const TagElement* element)
     return {text.c_str(), static_cast<int>(text.size())};
 }
 
+/// Where code extensions end.
+const char* delimitersOf(DcmEVR vr)
+{
+    switch (vr) {
+    case EVR_PN:
+        return "\\^=";
+    case EVR_LO:
+    case EVR_SH:
+    case EVR_UC:
+        return "\\";
+    default:
+        return "";
+    }
+}
+
 QByteArray storedIn(const TagMap& node)
 {
     const TagElement* element = node.findElement(DCM_SpecificCharacterSet);
@@ -74,10 +89,26 @@ bool TextConversion::nextWay(unsigned int findings)
 
 QByteArray TextConversion::characterSetOf(const TagMap& item, const QByteArray& above) const
 {
-    if (mWay != Way::Each)
+    if (mWay == Way::Together)
         return above;
     const QByteArray own = declaredBy(item.findElement(DCM_SpecificCharacterSet));
     return own.isEmpty() ? above : own;
+}
+
+bool TextConversion::concerns(DcmEVR vr)
+{
+    switch (vr) {
+    case EVR_LO:
+    case EVR_LT:
+    case EVR_PN:
+    case EVR_SH:
+    case EVR_ST:
+    case EVR_UC:
+    case EVR_UT:
+        return true;
+    default:
+        return false;
+    }
 }
 
 bool TextConversion::keepsAscii(const QByteArray& characterSet) const
@@ -93,23 +124,36 @@ bool TextConversion::keepsAscii(const QByteArray& characterSet) const
     return true;
 }
 
-unsigned int TextConversion::convert(DcmElement& element, const QByteArray& characterSet)
+/// False when the declared set does not explain the value.
+bool TextConversion::convertTogether(QByteArray& value, DcmEVR vr)
 {
-    switch (mWay) {
-    case Way::Together:
-        if (!mIsUtf8 && (!mIsSelected || element.convertCharacterSet(mConverter).bad()))
-            return kUnexplained;
-        // What is not subject to the declared set, or declares itself as UTF-8, was not looked at.
-        convertValueToUtf8(element, kUtf8);
-        return 0;
-    case Way::Each:
-        return convertValueToUtf8(element, characterSet) ? kChanged : 0;
-    case Way::AsStored:
-        // Nothing that was looked at is changed by it, but the declaration itself was not looked at so far.
-        convertValueToUtf8(element, characterSet);
-        return 0;
-    }
-    return 0;
+    if (mIsUtf8)
+        return true;
+    if (!mIsSelected)
+        return false;
+    if (!concerns(vr) || value.isEmpty())
+        return true;
+    OFString converted;
+    if (mConverter
+            .convertString(value.constData(), static_cast<std::size_t>(value.size()), converted,
+                           delimitersOf(vr))
+            .bad())
+        return false;
+    value = QByteArray(converted.data(), static_cast<int>(converted.size()));
+    return true;
+}
+
+unsigned int TextConversion::convert(QByteArray& value, DcmEVR vr, const QByteArray& characterSet)
+{
+    if (mWay == Way::Together && !convertTogether(value, vr))
+        return kUnexplained;
+    // What is not subject to the declared set, or declares itself as UTF-8, was not looked at so far; as is the declaration
+    // where texts are as stored.
+    const QByteArray converted =
+        utf8Of(value, mWay == Way::Together ? QByteArray(kUtf8) : characterSet, concerns(vr));
+    const bool hasChanged = converted != value;
+    value = converted;
+    return mWay == Way::Each && hasChanged ? kChanged : 0;
 }
 
 }  // namespace Kdd

@@ -5,8 +5,7 @@
 #include <dcmtk/config/osconfig.h>
 
 #include <dcmtk/dcmdata/dcspchrs.h>
-
-class DcmElement;
+#include <dcmtk/dcmdata/dcvr.h>
 
 namespace Kdd
 {
@@ -53,6 +52,9 @@ public:
     /// The first is `Together`.
     bool nextWay(unsigned int findings);
 
+    /// Whether texts of a VR are in the declared character set.
+    static bool concerns(DcmEVR vr);
+
     /// Of the image itself.
     const QByteArray& characterSet() const { return mCharacterSet; }
 
@@ -62,8 +64,8 @@ public:
     /// Whether texts of nothing but printable ASCII, declared to be in that set, stay as they are.
     bool keepsAscii(const QByteArray& characterSet) const;
 
-    /// Converts a value and gives what was found.
-    unsigned int convert(DcmElement& element, const QByteArray& characterSet);
+    /// Converts a value of a text VR and tells what was found.
+    unsigned int convert(QByteArray& value, DcmEVR vr, const QByteArray& characterSet);
 
     /// Found before anything is converted.
     unsigned int findings() const { return mWay == Way::Together && !mIsSelected ? kUnexplained : 0; }
@@ -73,6 +75,8 @@ private:
     QByteArray mCharacterSet;
     DcmSpecificCharacterSet mConverter;
     Way mWay = Way::Together;
+    bool convertTogether(QByteArray& value, DcmEVR vr);
+
     bool mIsUtf8 = false;
     bool mIsSelected = false;
     bool mReplacesAscii = false;

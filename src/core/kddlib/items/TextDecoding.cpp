@@ -225,6 +225,13 @@ QString decodeText(const QByteArray& bytes, const QByteArray& characterSet)
     return text + decodePart(bytes.mid(start), characterSet, pairs);
 }
 
+QByteArray utf8Of(const QByteArray& value, const QByteArray& characterSet, bool hasCharacterSet)
+{
+    if (isText(value, hasCharacterSet ? characterSet : QByteArray()))
+        return value;
+    return decodeText(value, characterSet).toUtf8();
+}
+
 bool convertToUtf8(DcmItem& dataset)
 {
     // DCMTK converts items by the character set of the whole dataset, whatever they declare.
@@ -250,14 +257,13 @@ bool convertValueToUtf8(DcmElement& element, const QByteArray& characterSet)
         return false;
     // With what stands behind a NUL, which not all forms end at.
     const QByteArray bytes(text, static_cast<int>(length));
-    // Codes and dates are ASCII whatever is declared.
-    if (isText(bytes, element.isAffectedBySpecificCharacterSet() ? characterSet : QByteArray()))
+    const QByteArray converted = utf8Of(bytes, characterSet, element.isAffectedBySpecificCharacterSet());
+    if (converted == bytes)
         return false;
-    const QByteArray converted = decodeText(bytes, characterSet).toUtf8();
     // Of the base class, for a UID would be looked for by its name behind "=".
     static_cast<DcmByteString&>(element).DcmByteString::putString(converted.constData(),
                                                                   static_cast<Uint32>(converted.size()));
-    return converted != bytes;
+    return true;
 }
 
 void declareUtf8(DcmItem& dataset)

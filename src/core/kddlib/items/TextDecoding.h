@@ -19,6 +19,10 @@ KDD_EXPORT QString decodeText(const QByteArray& bytes, const QByteArray& charact
 /// Whether texts of this character set show another character where ASCII has the tilde. In all others ASCII is itself.
 KDD_EXPORT bool replacesTilde(const QByteArray& characterSet);
 
+/// A value of a text VR in UTF-8, as `decodeText` decodes it. Without a character set of its own, as codes, dates and
+/// numbers, what is ASCII stays as it is.
+KDD_EXPORT QByteArray utf8Of(const QByteArray& value, const QByteArray& characterSet, bool hasCharacterSet);
+
 /// Converts a dataset to UTF-8 as a whole, declared character set included. False when that cannot be done: a text
 /// does not fit its character set, or items declare one of their own. The dataset may be half converted then.
 KDD_EXPORT bool convertToUtf8(DcmItem& dataset);

@@ -121,12 +121,10 @@ std::unique_ptr<DcmElement> bytesElement(VrCode vr, const DcmTag& tag, const QBy
 
 }  // namespace
 
-/// The dictionary's tag where it agrees, for it may ask for a younger VR than a code can tell; else one of our own VR:
-/// an unknown tag would have DCMTK write words as nothing and sequences as bytes.
+/// An unknown tag would have DCMTK write words as nothing and sequences as bytes.
 DcmTag TagElement::tagFor(const DcmTagKey& key) const
 {
-    const DcmEVR known = hasSeveralVrs(mVr) ? dictionaryEvr(key) : EVR_UNKNOWN;
-    return DcmTag(key, known != EVR_UNKNOWN && vrCodeOf(known) == mVr ? known : evrOf(mVr));
+    return DcmTag(key, evrOf(mVr, key));
 }
 
 DcmElement* TagElement::createDcmElement(const DcmTagKey& key) const

@@ -76,6 +76,12 @@ DcmEVR dictionaryEvr(const DcmTagKey& key)
     return DcmTag(key).getEVR();
 }
 
+DcmEVR evrOf(VrCode code, const DcmTagKey& key)
+{
+    const DcmEVR known = hasSeveralVrs(code) ? dictionaryEvr(key) : EVR_UNKNOWN;
+    return known != EVR_UNKNOWN && vrCodeOf(known) == code ? known : evrOf(code);
+}
+
 const char* vrName(VrCode code)
 {
     // DcmVR knows the names of static storage only, so the pointer outlives the object.

@@ -75,6 +75,10 @@ KDD_EXPORT bool hasSeveralVrs(VrCode code);
 /// tells.
 KDD_EXPORT DcmEVR dictionaryEvr(const DcmTagKey& key);
 
+/// DCMTK's VR of an attribute whose value is stored under that code: the dictionary's where that agrees with the code, which
+/// tells the younger VRs apart, else the code's.
+KDD_EXPORT DcmEVR evrOf(VrCode code, const DcmTagKey& key);
+
 /// DCMTK's name of the VR ("PN", "ox", ...), and its name for an unknown one ("??").
 KDD_EXPORT const char* vrName(VrCode code);
 
