@@ -26,13 +26,25 @@ using Clock = std::chrono::steady_clock;
 /// Images held in memory, of some 10 KiB each. What goes beyond is read from its file when its study is completed.
 constexpr int kMaxHeldImages = 20000;
 
-// A study that others work on, or that cannot be completed, is tried again after so long, then after twice that.
+// A study that others work on, or that cannot be completed, is tried again after so long, then after twice that: a disk that
+// was full, or a database that was away, is noticed after no more than the time that it took once more.
 constexpr auto kFirstPause = std::chrono::seconds(2);
-constexpr int kMostFailures = 6;
+constexpr std::chrono::seconds kLongestPause = std::chrono::hours(1);
+
+// From then on its images are not held any more, but read from their files.
+constexpr int kHeldFailures = 6;
 
 // In a study that takes long to complete arrivals are gathered for so many times as long, so that the work stays in
 // proportion to what arrives.
 constexpr int kGatherTimes = 3;
+
+Clock::duration pauseAfter(int failures)
+{
+    // No pause comes near to this many doublings.
+    constexpr int kMostDoublings = 30;
+    return std::min<Clock::duration>(kFirstPause * (1LL << std::min(failures - 1, kMostDoublings)),
+                                     kLongestPause);
+}
 
 struct PendingStudy
 {
@@ -266,7 +278,7 @@ QList<QByteArray> ArrivedStudies::waiting() const
     const std::lock_guard<std::mutex> lock(d->mutex);
     QList<QByteArray> studies(d->running.begin(), d->running.end());
     for (const auto& study : d->pending) {
-        if (!d->running.contains(study.first))
+        if (!d->running.contains(study.first) && d->failures.value(study.first) < kHeldFailures)
             studies.append(study.first);
     }
     return studies;
@@ -332,13 +344,13 @@ void ArrivedStudies::Private::conclude(const QByteArray& studyUID, bool isDone, 
         took.insert(studyUID, time);
     const int count = isDone ? 0 : failures.value(studyUID) + 1;
     failures.remove(studyUID);
-    if (count > 0 && count < kMostFailures) {
+    if (count > 0) {
         failures.insert(studyUID, count);
-        PendingStudy& study = obtain(studyUID);
-        study.due = Clock::now() + kFirstPause * (1 << (count - 1));
-    } else if (count > 0) {
-        LogFile::warnf("Study %s waits to be built", studyUID.constData());
-        takeLocked(studyUID);
+        if (count == kHeldFailures) {
+            LogFile::warnf("Study %s waits to be built", studyUID.constData());
+            takeLocked(studyUID);
+        }
+        obtain(studyUID).due = Clock::now() + pauseAfter(count);
     }
     changed.notify_all();
 }

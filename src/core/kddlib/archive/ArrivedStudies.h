@@ -70,8 +70,8 @@ public:
     };
 
     /// Brings into the study's tag file what has arrived by now; nothing where nothing has. Waits up to `patienceMs` [ms]
-    /// for another thread that does it, and as long for another process that works on the study. What fails is tried again
-    /// later, a few times, and then left to whoever works the queue off.
+    /// for another thread that does it, and as long for another process that works on the study. What fails is due again
+    /// later, after longer and longer pauses of up to an hour.
     Attempt attempt(const QByteArray& studyUID, Kxg::Catalogue& catalogue, int patienceMs);
 
     /// The same for whoever need not know why it failed.
@@ -80,7 +80,8 @@ public:
     /// Whether something of the study is not in its tag file yet.
     bool isWaiting(const QByteArray& studyUID) const;
 
-    /// The studies of which something is not in the tag file yet.
+    /// The studies of which something is not in the tag file yet, but for those that have failed again and again: to try
+    /// them is for whoever asks for one of them, and for `awaitDue`.
     QList<QByteArray> waiting() const;
 
 private:
