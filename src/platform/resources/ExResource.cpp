@@ -1,14 +1,6 @@
 #include "platform/resources/ExResource.h"
 
-#include "platform/base/LogFile.h"
-#include "platform/os/PathName.h"
-
-#include <QFile>
-#include <QFileInfo>
-#include <QHash>
-#include <QSettings>
-#include <QStandardPaths>
-#include <QStringList>
+#include "platform/resources/Setting.h"
 
 #include <limits>
 
@@ -17,14 +9,6 @@ namespace Kdd
 namespace
 {
 
-struct Setting
-{
-    const char* variable;
-    const char* key;  ///< in the file
-    const char* standard;
-};
-
-// Name in the environment, key in the file, and what counts without either.
 constexpr Setting kWebHost = {"KDD_WEB_HOST", "web/host", "localhost"};
 constexpr Setting kCloudDownload = {"KDD_CLOUD_DOWNLOAD", "cloud/download",
                                     "https://storage-download.googleapis.com/"};
@@ -81,72 +65,11 @@ constexpr Setting kDicomAssociations = {"KDD_DICOM_ASSOCIATIONS", "dicom/associa
 constexpr Setting kDicomAnswers = {"KDD_DICOM_ANSWERS", "dicom/answers", "10000"};
 constexpr Setting kDicomIdle = {"KDD_DICOM_IDLE", "dicom/idle", "300"};
 
-using Values = QHash<QString, QByteArray>;
-
-QString filePath()
-{
-    QString named = QFile::decodeName(qgetenv("KDD_CONFIG"));
-    if (!named.isEmpty())
-        return named;
-    return QStandardPaths::writableLocation(QStandardPaths::GenericConfigLocation) +
-           QLatin1String("/kdd/kdd.ini");
-}
-
-Values readFile()
-{
-    const QString path = filePath();
-    // Nothing is read then, because Qt would look for a file of another name.
-    if (!isPlainText(qgetenv("KDD_CONFIG"))) {
-        LogFile::warnf("The settings in %s cannot be read: the name is no text",
-                       qgetenv("KDD_CONFIG").constData());
-        return {};
-    }
-    // Nobody has to have a file, but one that is named is meant to be there.
-    const bool isNamed = !qEnvironmentVariableIsEmpty("KDD_CONFIG");
-    if (!QFileInfo::exists(path) && !isNamed)
-        return {};
-    QSettings file(path, QSettings::IniFormat);
-    // Qt would take Latin-1 otherwise, whatever the locale is.
-    file.setIniCodec("UTF-8");
-    Values values;
-    const QStringList keys = file.allKeys();
-    // What looks like a list is a value with commas that nobody put in quotes.
-    for (const QString& key : keys)
-        values.insert(key, file.value(key).toStringList().join(QLatin1Char(',')).toUtf8());
-    if (file.status() != QSettings::NoError || !QFileInfo(path).isReadable())
-        LogFile::warnf("The settings in %s cannot be read", qUtf8Printable(path));
-    return values;
-}
-
-QByteArray valueOf(const Setting& setting)
-{
-    // Asked anew each time, while the file is read once.
-    QByteArray fromEnvironment = qgetenv(setting.variable);
-    if (!fromEnvironment.isEmpty())
-        return fromEnvironment;
-    // A copy, because an object that reads settings must not be shared by threads.
-    static const Values fromFile = readFile();
-    return fromFile.value(QLatin1String(setting.key), setting.standard);
-}
-
 QByteArray endpoint(const Setting& setting)
 {
     // The bucket's name is put directly behind.
     const QByteArray address = valueOf(setting);
     return address.endsWith('/') ? address : address + '/';
-}
-
-/// Of `least` to `most`; of anything else the standard, for a site's slip should not stop its server.
-int numberOf(const Setting& setting, int least, int most)
-{
-    const QByteArray text = valueOf(setting);
-    bool isNumber = false;
-    const int number = text.toInt(&isNumber);
-    if (isNumber && number >= least && number <= most)
-        return number;
-    LogFile::warnf("%s is \"%s\", which is no number of %d to %d; %s is taken", setting.variable,
-                   text.constData(), least, most, setting.standard);
-    return QByteArray(setting.standard).toInt();
 }
 
 }  // namespace
