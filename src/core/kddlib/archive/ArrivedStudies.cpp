@@ -222,7 +222,7 @@ Result ArrivedStudies::add(std::vector<DicomInput> images, const QHash<QByteArra
     }
     // While one registers the others wait here, and find that they were registered too or do it for all of them.
     const std::lock_guard<std::mutex> turn(d->registering);
-    const Result result = entry.isDone ? entry.result : d->registerQueued(catalogue);
+    Result result = entry.isDone ? entry.result : d->registerQueued(catalogue);
     corrected = std::move(entry.corrected);
     return result;
 }

@@ -2,7 +2,6 @@
 
 #include <QByteArray>
 
-#include <array>
 #include <string_view>
 
 class DcmTagKey;
@@ -17,9 +16,13 @@ struct AttributeName
     const char* creator;  ///< of a private one, where the form shows it; may be null, and else is
 };
 
-/// The alphabetic, the ideographic and the phonetic form of a person's name, without the spaces and the separators of
-/// components that pad them.
-using NameGroups = std::array<std::string_view, 3>;
+/// A person's name, without the spaces and the separators of components that pad its forms.
+struct NameGroups
+{
+    std::string_view alphabetic;
+    std::string_view ideographic;
+    std::string_view phonetic;
+};
 
 /// A way of writing down attributes, each for itself, so that what images share is written once and copied. Everything is
 /// appended to `out`, in UTF-8. Without state.

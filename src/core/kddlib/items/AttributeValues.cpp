@@ -64,9 +64,10 @@ Text takePart(Text& text, char separator)
     return part;
 }
 
-/// Without the separators behind its last component, and the spaces there.
-Text nameGroup(Text group)
+/// Up to the next group, and without the separators behind its last component.
+Text takeGroup(Text& name)
 {
+    const Text group = takePart(name, '=');
     const std::size_t last = group.find_last_not_of(" ^");
     return last == Text::npos ? Text() : group.substr(0, last + 1);
 }
@@ -74,8 +75,9 @@ Text nameGroup(Text group)
 void appendName(QByteArray& out, const AttributeForm& form, int index, Text name)
 {
     NameGroups groups;
-    for (Text& group : groups)
-        group = nameGroup(takePart(name, '='));
+    groups.alphabetic = takeGroup(name);
+    groups.ideographic = takeGroup(name);
+    groups.phonetic = takeGroup(name);
     form.name(out, index, groups);
 }
 

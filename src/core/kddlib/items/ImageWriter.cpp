@@ -187,7 +187,7 @@ void ImageWriter::writeEntries(Target& target, const TagMap& node)
         mForm.declareUtf8(target.text);
 }
 
-int ImageWriter::copyBelow(Target& target, const NodeText& above, int chunk, const DcmTagKey& key) const
+int ImageWriter::copyBelow(Target& target, const NodeText& above, int chunk, const DcmTagKey& key)
 {
     int end = chunk;
     while (end < above.chunks.size() && above.chunks.at(end).key < key)
@@ -196,7 +196,7 @@ int ImageWriter::copyBelow(Target& target, const NodeText& above, int chunk, con
     return end;
 }
 
-void ImageWriter::copy(Target& target, const NodeText& above, int begin, int end) const
+void ImageWriter::copy(Target& target, const NodeText& above, int begin, int end)
 {
     if (begin == end)
         return;

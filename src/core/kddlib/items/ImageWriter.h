@@ -81,8 +81,8 @@ private:
     void writeEntries(Target& target, const TagMap& node);
 
     /// Copies the attributes from `chunk` on whose keys are smaller; the first that is not.
-    int copyBelow(Target& target, const NodeText& above, int chunk, const DcmTagKey& key) const;
-    void copy(Target& target, const NodeText& above, int begin, int end) const;
+    static int copyBelow(Target& target, const NodeText& above, int chunk, const DcmTagKey& key);
+    static void copy(Target& target, const NodeText& above, int begin, int end);
 
     void attribute(Target& target, const TagMap& node, const DcmTagKey& key, const TagElement& element,
                    const Place& place);

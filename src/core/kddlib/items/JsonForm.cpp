@@ -176,16 +176,18 @@ void JsonForm::text(QByteArray& out, int index, Text text) const
 
 void JsonForm::name(QByteArray& out, int index, const NameGroups& groups) const
 {
-    static const char* const kGroups[] = {R"("Alphabetic":)", R"("Ideographic":)", R"("Phonetic":)"};
     beginValue(out, index);
     char separator = '{';
-    for (std::size_t i = 0; i < groups.size(); ++i) {
-        if (groups.at(i).empty())
-            continue;
-        out.append(separator).append(kGroups[i]);
-        appendQuoted(out, groups.at(i));
+    const auto append = [&](const char* form, Text group) {
+        if (group.empty())
+            return;
+        out.append(separator).append('"').append(form).append("\":");
+        appendQuoted(out, group);
         separator = ',';
-    }
+    };
+    append("Alphabetic", groups.alphabetic);
+    append("Ideographic", groups.ideographic);
+    append("Phonetic", groups.phonetic);
     out.append(separator == ',' ? "}" : "null");
 }
 

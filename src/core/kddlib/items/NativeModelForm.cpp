@@ -15,7 +15,6 @@ namespace
 
 using Text = std::string_view;
 
-constexpr const char* kGroups[] = {"Alphabetic", "Ideographic", "Phonetic"};
 constexpr const char* kComponents[] = {"FamilyName", "GivenName", "MiddleName", "NamePrefix", "NameSuffix"};
 
 /// Text as XML can hold it. Control characters have no form there, not even an escaped one.
@@ -83,6 +82,8 @@ void endValue(QByteArray& out, const char* element)
 
 void appendComponents(QByteArray& out, const char* element, Text group)
 {
+    if (group.empty())
+        return;
     out.append('<').append(element).append('>');
     for (const char* component : kComponents) {
         const std::size_t end = group.find('^');
@@ -124,10 +125,9 @@ void NativeModelForm::text(QByteArray& out, int index, Text text) const
 void NativeModelForm::name(QByteArray& out, int index, const NameGroups& groups) const
 {
     beginValue(out, "PersonName", index);
-    for (std::size_t i = 0; i < groups.size(); ++i) {
-        if (!groups.at(i).empty())
-            appendComponents(out, kGroups[i], groups.at(i));
-    }
+    appendComponents(out, "Alphabetic", groups.alphabetic);
+    appendComponents(out, "Ideographic", groups.ideographic);
+    appendComponents(out, "Phonetic", groups.phonetic);
     endValue(out, "PersonName");
 }
 
