@@ -25,6 +25,7 @@ protected:
                                  "StudyDate=20240101|StudyTime=233000|TimezoneOffsetFromUTC=+0100|"
                                  "StudyDescription=Head CT|Modality=CT|SeriesNumber=2|BodyPartExamined=HEAD")
                            .with(DCM_InstanceNumber, QByteArray(sop).right(1))
+                           .with(DCM_InstitutionAddress, "Main Road 1\r\nTown")
                            .withItem(DCM_RequestAttributesSequence,
                                      anItem().with("ScheduledProcedureStepID=STEP1|RequestedProcedureID=RP1"))
                            .withItem(DCM_RequestAttributesSequence,
