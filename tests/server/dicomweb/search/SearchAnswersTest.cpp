@@ -26,6 +26,9 @@ protected:
                                  "StudyDescription=Head CT|Modality=CT|SeriesNumber=2|BodyPartExamined=HEAD")
                            .with(DCM_InstanceNumber, QByteArray(sop).right(1))
                            .with(DCM_InstitutionAddress, "Main Road 1\r\nTown")
+                           .with(DCM_FrameIncrementPointer, "(0018,1063)")
+                           .with(DCM_SelectorFLValue, "-2.59096709e-07")
+                           .with(DCM_SelectorFDValue, "0.123456789")
                            .withItem(DCM_RequestAttributesSequence,
                                      anItem().with("ScheduledProcedureStepID=STEP1|RequestedProcedureID=RP1"))
                            .withItem(DCM_RequestAttributesSequence,
@@ -154,6 +157,10 @@ const std::pair<const char*, const char*> kSearches[] = {
     {"SeriesNumber=1e30", ""},
     {"BodyPartExamined=HEAD&PatientID=P1", "1.1"},
     {"BodyPartExamined=FOOT&PatientID=P1", ""},
+    {"SelectorFDValue=0.123456789&PatientID=P1", "1.1"},
+    {"SelectorFDValue=0.123457&PatientID=P1", ""},
+    {"SelectorFLValue=-2.59096709e-07&PatientID=P1", "1.1"},
+    {"FrameIncrementPointer=00181063&PatientID=P1", "1.1"},
     {"SOPClassesInStudy=1.2.840.10008.5.1.4.1.1.7&StudyInstanceUID=1.1,2", "1.1 2"},
     {"orderby=PatientName", "2 1.1"},
     {"orderby=-PatientID", "1.1 2"},
