@@ -206,6 +206,16 @@ TEST_P(SearchAnswers, FindWhatTheyShow)
     }
 }
 
+TEST_P(SearchAnswers, FindEachModalityOfASeriesOfSeveral)
+{
+    store("8", image("8.1.1", "8", "8.1").with(DCM_Modality, "PT\\CT"));
+    add();
+    EXPECT_EQ(jsonAt(list("studies"), "0/00080061/Value"),
+              (QJsonArray{QStringLiteral("CT"), QStringLiteral("PT")}));
+    for (const char* modality : {"CT", "PT"})
+        EXPECT_EQ(studies("ModalitiesInStudy=" + QByteArray(modality)), "8") << modality;
+}
+
 const std::pair<const char*, const char*> kNames[] = {
     {"harris^", "1"},
     {"^harris", "2"},
