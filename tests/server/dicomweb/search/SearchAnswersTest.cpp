@@ -361,8 +361,16 @@ TEST_P(SearchAnswers, AreCompressedForThoseWhoTakeIt)
 
 TEST_P(SearchAnswers, SayWhereValuesThatTheyLeaveOutAre)
 {
-    store("3.1", image("3.1", "3", "3.9").withLong(DCM_PatientComments, 3000));
+    store("3.1", image("3.1", "3", "3.9")
+                     .withLong(DCM_PatientComments, 3000)
+                     .withItem(DCM_ProcedureCodeSequence,
+                               anItem().with("CodeValue=C1").withLong(DCM_CodeMeaning, 3000)));
     add();
+    const QByteArray place = "0/00081032/Value/0/00080104/BulkDataURI";
+    EXPECT_EQ(textAt(list("studies/3/instances?includefield=ProcedureCodeSequence"), place),
+              "http://host/dicom-web/studies/3/series/3.9/instances/3.1/bulkdata/00081032/0/00080104");
+    EXPECT_EQ(textAt(list("studies?includefield=all"), "0/00081032/Value/0/00080100/Value/0"), "C1");
+    EXPECT_EQ(textAt(list("studies?includefield=all"), place), "") << "of a study it has none";
     EXPECT_EQ(textAt(list("studies/3/instances?includefield=all"), "0/00104000/BulkDataURI"),
               "http://host/dicom-web/studies/3/series/3.9/instances/3.1/bulkdata/00104000");
 }
