@@ -206,8 +206,8 @@ private:
         require(path.startsWith(kInstance), "a value is one of the instance");
         const QByteArray given = bodyOf(path, "*/*");
         DcmElement& element = elementAt(path.mid(path.indexOf("bulkdata/") + 9).split('/'));
-        // What is no UID DCMTK changes as it reads it.
-        if (element.getVR() == EVR_UI)
+        // Of UIDs and codes DCMTK takes off what is none as it reads them.
+        if (element.getVR() == EVR_UI || element.getVR() == EVR_CS)
             return;
         const QByteArray held = valueOf(element);
         // It reads one of odd length with something behind.

@@ -147,7 +147,10 @@ void addValue(DcmItem& item, const QueryKey& key, const QJsonObject& element)
         return;
     }
     DcmElement* made = nullptr;
-    if (DcmItem::newDicomElementWithVR(made, tag).bad())
+    // Pixels without value DCMTK writes in items as it cannot read them.
+    if (key.key == DCM_PixelData)
+        made = new DcmOtherByteOtherWord(DcmTag(key.key, EVR_OW));
+    else if (DcmItem::newDicomElementWithVR(made, tag).bad())
         return;
     // Where the text is none of its VR the element stays without value.
     const QByteArray text = textsOf(values, tag.getEVR());
