@@ -1,5 +1,6 @@
 // Attributes of any kind and content, in sequences too: what clients are given of them is JSON and XML that can be read.
 
+#include "fuzz/Choices.h"
 #include "fuzz/Property.h"
 #include "kddlib/items/DicomJson.h"
 #include "kddlib/tagmodel/TagElement.h"
@@ -37,31 +38,6 @@ const DcmTagKey kKeys[] = {DCM_SpecificCharacterSet,
                            {0x0009, 0x0010},
                            {0x0009, 0x1001},
                            DCM_StudyInstanceUID};
-
-/// Takes its decisions from the bytes of a run, and zeros behind them.
-class Choices
-{
-public:
-    explicit Choices(const QByteArray& bytes)
-        : mBytes(bytes)
-    {
-    }
-
-    bool isAtEnd() const { return mAt >= mBytes.size(); }
-    int next() { return isAtEnd() ? 0 : static_cast<unsigned char>(mBytes.at(mAt++)); }
-
-    QByteArray value()
-    {
-        const int length = next();
-        const QByteArray taken = mBytes.mid(mAt, length);
-        mAt += taken.size();
-        return taken;
-    }
-
-private:
-    const QByteArray& mBytes;
-    int mAt = 0;
-};
 
 /// An attribute is its place among the keys, its VR, and a value or the number of items.
 void fill(TagMap& map, Choices& choices, int depth)

@@ -56,9 +56,12 @@ QByteArray numberText(const QByteArray& text)
 QList<QByteArray> modalitiesOf(const StudySearchRecord& study)
 {
     QSet<QByteArray> found;
+    // A series that names several is of each: answers list them one by one.
     for (const SeriesSearchRecord& series : study.series) {
-        if (!series.modality.isEmpty())
-            found.insert(series.modality.left(kMostIndexed));
+        for (const QByteArray& each : series.modality.split('\\')) {
+            if (!each.trimmed().isEmpty())
+                found.insert(each.trimmed().left(kMostIndexed));
+        }
     }
     QList<QByteArray> sorted = found.values();
     std::sort(sorted.begin(), sorted.end());

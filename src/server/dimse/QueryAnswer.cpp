@@ -10,6 +10,8 @@
 
 #include <dcmtk/dcmdata/dctk.h>
 
+#include <cmath>
+#include <limits>
 #include <memory>
 
 namespace Kdd::Dimse
@@ -50,12 +52,21 @@ QString tagOf(const QString& digits)
     return QStringLiteral("(%1,%2)").arg(digits.left(4), digits.mid(4));
 }
 
+/// Whole numbers without exponent, which their VRs do not take.
+QString numberOf(double number)
+{
+    constexpr double kExact = 9007199254740992;  // beyond it not every whole number is one of these
+    const bool isWhole = std::abs(number) <= kExact && number == std::floor(number);
+    return isWhole ? QString::number(static_cast<qint64>(number))
+                   : QString::number(number, 'g', QLocale::FloatingPointShortest);
+}
+
 QString textOf(const QJsonValue& value, DcmEVR vr)
 {
     if (value.isObject())
         return nameOf(value.toObject());
     if (value.isDouble())
-        return QString::number(value.toDouble(), 'g', QLocale::FloatingPointShortest);
+        return numberOf(value.toDouble());
     return vr == EVR_AT ? tagOf(value.toString()) : value.toString();
 }
 
@@ -67,10 +78,13 @@ QByteArray textsOf(const QJsonArray& values, DcmEVR vr)
     return texts.join(QLatin1Char('\\')).toUtf8();
 }
 
+/// Where VRs are not sent along, values are read by the dictionary's. What that does not know has the VR that was found.
 DcmTag tagOf(const DcmTagKey& key, const QJsonObject& element)
 {
+    const DcmTag known(key);
     const QByteArray vr = element.value(QLatin1String("vr")).toString().toLatin1();
-    return vr.size() == 2 ? DcmTag(key, DcmVR(vr.constData())) : DcmTag(key);
+    const bool isKnown = DcmVR(known.getEVR()).isStandard() && known.getEVR() != EVR_UN;
+    return vr.size() == 2 && !isKnown ? DcmTag(key, DcmVR(vr.constData())) : known;
 }
 
 void fill(DcmItem& item, const QJsonObject& object, const std::vector<QueryKey>& keys);
@@ -101,20 +115,48 @@ void addItems(DcmItem& item, const DcmTag& tag, const QJsonArray& values, const 
         static_cast<void>(sequence.release());
 }
 
+/// JSON has texts for what is not finite.
+double realOf(const QJsonValue& value)
+{
+    using Limits = std::numeric_limits<double>;
+    const QString text = value.toString();
+    if (text == QLatin1String("Infinity") || text == QLatin1String("-Infinity"))
+        return text.startsWith(QLatin1Char('-')) ? -Limits::infinity() : Limits::infinity();
+    return text == QLatin1String("NaN") ? Limits::quiet_NaN() : value.toDouble();
+}
+
+/// Not as texts, of which DCMTK reads some a little off, and does not take what is not finite.
+void putReals(DcmElement& element, const QJsonArray& values)
+{
+    for (int i = 0; i < values.size(); ++i) {
+        const double number = realOf(values.at(i));
+        if (element.getVR() == EVR_FD)
+            element.putFloat64(number, static_cast<unsigned long>(i));
+        else
+            element.putFloat32(static_cast<Float32>(number), static_cast<unsigned long>(i));
+    }
+}
+
 void addValue(DcmItem& item, const QueryKey& key, const QJsonObject& element)
 {
     const DcmTag tag = tagOf(key.key, element);
     const QJsonArray values = element.value(QLatin1String("Value")).toArray();
     if (tag.getEVR() == EVR_SQ) {
-        addItems(item, tag, values, key.items);
+        const bool hasItems = element.value(QLatin1String("vr")).toString() == QLatin1String("SQ");
+        addItems(item, tag, hasItems ? values : QJsonArray(), key.items);
         return;
     }
     DcmElement* made = nullptr;
-    if (DcmItem::newDicomElement(made, tag).bad())
+    // Pixels without value DCMTK writes in items as it cannot read them.
+    if (key.key == DCM_PixelData)
+        made = new DcmOtherByteOtherWord(DcmTag(key.key, EVR_OW));
+    else if (DcmItem::newDicomElementWithVR(made, tag).bad())
         return;
     // Where the text is none of its VR the element stays without value.
     const QByteArray text = textsOf(values, tag.getEVR());
-    if (!text.isEmpty())
+    if (tag.getEVR() == EVR_FD || tag.getEVR() == EVR_FL)
+        putReals(*made, values);
+    else if (!text.isEmpty())
         made->putString(text.constData());
     if (item.insert(made, OFTrue).bad())
         delete made;

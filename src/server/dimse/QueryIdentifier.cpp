@@ -1,5 +1,10 @@
 #include "server/dimse/QueryIdentifier.h"
 
+#include "server/dicomweb/search/AnswerObject.h"
+
+#include <QLocale>
+#include <QStringList>
+
 #include <dcmtk/dcmdata/dctk.h>
 #include <kddlib/StudyIndexing.h>
 #include <kddlib/TextDecoding.h>
@@ -54,8 +59,39 @@ const CountedKey kCounted[] = {
     {DCM_SeriesInstanceUID, QueryLevel::Series},
 };
 
+/// With all their digits, which DCMTK's texts of them do not have.
+QString realsOf(DcmElement& element)
+{
+    QStringList numbers;
+    Float64 wide = 0;
+    Float32 narrow = 0;
+    const bool isWide = element.ident() == EVR_FD;
+    for (unsigned long i = 0; i < element.getVM(); ++i) {
+        if (isWide ? element.getFloat64(wide, i).good() : element.getFloat32(narrow, i).good())
+            numbers << QString::number(isWide ? wide : static_cast<double>(narrow), 'g',
+                                       QLocale::FloatingPointShortest);
+    }
+    return numbers.join(QLatin1Char('\\'));
+}
+
+/// By their digits alone, as searches know them.
+QString tagsOf(DcmElement& element)
+{
+    QStringList tags;
+    DcmTagKey tag;
+    for (unsigned long i = 0; i < element.getVM(); ++i) {
+        if (element.getTagVal(tag, i).good())
+            tags << QString::fromLatin1(DicomWeb::keyName(tag));
+    }
+    return tags.join(QLatin1Char('\\'));
+}
+
 QString decodedValue(DcmElement& element, const QByteArray& characterSet)
 {
+    if (element.ident() == EVR_FD || element.ident() == EVR_FL)
+        return realsOf(element);
+    if (element.ident() == EVR_AT)
+        return tagsOf(element);
     OFString value;
     if (element.getOFStringArray(value).bad())
         return {};

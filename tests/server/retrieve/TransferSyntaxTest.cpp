@@ -76,6 +76,20 @@ TEST_F(TransferSyntaxTest, IsTheOneThatIsAskedForWithAllPixelsAndCorrections)
     }
 }
 
+TEST_F(TransferSyntaxTest, OfPixelsThatAreNoneByTheirVrCanBeRead)
+{
+    add("a.dcm", anImage().data(DcmTag(DCM_PixelData, EVR_UN), mPixels));
+    const QByteArray stored = fileContent(path("a.dcm"));
+    const int at = stored.indexOf(QByteArray("\xe0\x7f\x10\x00UN", 6));
+    // As numbers, whose length has two bytes.
+    putFile(path("a.dcm"), QByteArray(stored).replace(at + 4, 8, "SL" + stored.mid(at + 8, 2)));
+    correct(DCM_PatientName, "Right^Name");
+    E_TransferSyntax given = EXS_Unknown;
+    const QByteArray dicom = bodyOf(get(kInstance, asked(EXS_LittleEndianExplicit)));
+    EXPECT_EQ(nameIn(dicom), "Right^Name");
+    EXPECT_TRUE(pixelsIn(dicom, given) == mPixels);
+}
+
 TEST_F(TransferSyntaxTest, OfFramesIsThatOfTheObject)
 {
     add("a.dcm", anImageWithFrames(kFrames));

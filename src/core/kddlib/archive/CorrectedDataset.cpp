@@ -16,6 +16,8 @@
 #include <dcmtk/dcmdata/dctk.h>
 #include <dcmtk/dcmdata/dcwcache.h>
 
+#include <algorithm>
+#include <iterator>
 #include <memory>
 #include <vector>
 
@@ -205,11 +207,20 @@ qint64 lengthOf(const FrameIndex& index, Pixels pixels)
     return -1;
 }
 
+/// Whether the length of an element of this VR has four bytes, as that of pixels is written.
+bool hasLongLength(const QByteArray& vr)
+{
+    static const char* const kVrs[] = {"OB", "OD", "OF", "OL", "OV", "OW", "SQ",
+                                       "SV", "UC", "UN", "UR", "UT", "UV"};
+    return std::any_of(std::begin(kVrs), std::end(kVrs), [&](const char* each) { return vr == each; });
+}
+
 QByteArray vrOf(const FrameIndex& index, Pixels pixels, DcmDataset& dataset)
 {
     Uint16 bits = 0;
+    // What else a file has there are bytes all the same.
     if (pixels == Pixels::Stored)
-        return index.pixelVr();
+        return hasLongLength(index.pixelVr()) ? index.pixelVr() : QByteArray("OW");
     dataset.findAndGetUint16(DCM_BitsAllocated, bits);
     return pixels == Pixels::Decoded && bits > 8 ? "OW" : "OB";
 }

@@ -6,6 +6,7 @@
 #include "kddlib/tagmodel/TagSequence.h"
 #include "platform/database/SearchText.h"
 
+#include <QJsonArray>
 #include <QJsonDocument>
 #include <QJsonObject>
 
@@ -131,6 +132,32 @@ private:
     QByteArray mCharacterSet;
 };
 
+QJsonObject withoutOmitted(const QJsonObject& object);
+
+/// The items of a sequence without what the tag file left out: of a study or series that has no address.
+QJsonObject elementWithoutOmitted(QJsonObject element)
+{
+    if (element.value(QLatin1String("vr")) != QLatin1String("SQ"))
+        return element;
+    QJsonArray items;
+    for (const QJsonValue& item : element.value(QLatin1String("Value")).toArray())
+        items.append(withoutOmitted(item.toObject()));
+    if (!items.isEmpty())
+        element.insert(QLatin1String("Value"), items);
+    return element;
+}
+
+QJsonObject withoutOmitted(const QJsonObject& object)
+{
+    QJsonObject kept;
+    for (auto it = object.begin(); it != object.end(); ++it) {
+        const QJsonObject element = it.value().toObject();
+        if (!element.contains(QLatin1String("BulkDataURI")))
+            kept.insert(it.key(), elementWithoutOmitted(element));
+    }
+    return kept;
+}
+
 /// The attributes as answers show them, a line for each.
 template <size_t n>
 QByteArray attributeLines(const TagMap& image, const DcmTagKey (&keys)[n])
@@ -144,7 +171,7 @@ QByteArray attributeLines(const TagMap& image, const DcmTagKey (&keys)[n])
     std::ostringstream json;
     writeDicomJson(json, chosen, std::string());
     const QByteArray text = QByteArray::fromStdString(json.str());
-    const QJsonObject object = QJsonDocument::fromJson(text).object();
+    const QJsonObject object = withoutOmitted(QJsonDocument::fromJson(text).object());
     QByteArray lines;
     for (auto it = object.begin(); it != object.end(); ++it) {
         // An attribute without value says nothing here, and there are viewers that fall over one.

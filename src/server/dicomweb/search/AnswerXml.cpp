@@ -116,7 +116,7 @@ private:
             else if (vr == QLatin1String("PN"))
                 personName(values.at(i).toObject());
             else
-                mXml.writeCharacters(writable(values.at(i).toVariant().toString()));
+                characters(values.at(i).toVariant().toString());
             mXml.writeEndElement();
         }
         if (element.contains(QLatin1String("InlineBinary")))
@@ -138,10 +138,24 @@ private:
             mXml.writeStartElement(QLatin1String(group));
             const QStringList components = text.split(QLatin1Char('^'));
             for (int i = 0; i < std::min(components.size(), static_cast<int>(std::size(kComponents))); ++i) {
-                if (!components.at(i).isEmpty())
-                    mXml.writeTextElement(QLatin1String(kComponents[i]), writable(components.at(i)));
+                if (components.at(i).isEmpty())
+                    continue;
+                mXml.writeStartElement(QLatin1String(kComponents[i]));
+                characters(components.at(i));
+                mXml.writeEndElement();
             }
             mXml.writeEndElement();
+        }
+    }
+
+    /// Whoever reads a carriage return as it is takes it for the end of a line.
+    void characters(const QString& text)
+    {
+        const QStringList lines = writable(text).split(QLatin1Char('\r'));
+        for (int i = 0; i < lines.size(); ++i) {
+            if (i > 0)
+                mXml.writeEntityReference(QStringLiteral("#13"));
+            mXml.writeCharacters(lines.at(i));
         }
     }
 

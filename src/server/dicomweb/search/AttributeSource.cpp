@@ -5,11 +5,14 @@
 #include <QJsonArray>
 #include <QJsonDocument>
 #include <QJsonObject>
+#include <QtEndian>
 
 #include <dcmtk/dcmdata/dcdeftag.h>
 #include <kddlib/TagMap.h>
 #include <kddlib/TagSequence.h>
 #include <kddlib/TextDecoding.h>
+
+#include <charconv>
 
 namespace Kdd::DicomWeb
 {
@@ -46,6 +49,27 @@ bool hasOneValueOnly(VrCode vr)
     return vr == VrCode::LT || vr == VrCode::ST || vr == VrCode::UT;
 }
 
+/// With all their digits, as answers have them: who asks for what he was shown finds it.
+template <typename Real>
+void appendReals(const QByteArray& bytes, QStringList& values)
+{
+    constexpr int kSize = sizeof(Real);
+    for (int at = 0; at + kSize <= bytes.size(); at += kSize) {
+        char digits[32];
+        const auto written =
+            std::to_chars(digits, digits + sizeof digits, qFromLittleEndian<Real>(bytes.constData() + at));
+        values.append(QString::fromLatin1(digits, static_cast<int>(written.ptr - digits)));
+    }
+}
+
+/// By their digits alone, likewise.
+void appendTags(const QByteArray& bytes, QStringList& values)
+{
+    for (int at = 0; at + 4 <= bytes.size(); at += 4)
+        values.append(QString::fromLatin1(keyName({qFromLittleEndian<quint16>(bytes.constData() + at),
+                                                   qFromLittleEndian<quint16>(bytes.constData() + at + 2)})));
+}
+
 void collect(const TagMap& map, const QVector<DcmTagKey>& path, int depth, const QByteArray& characterSet,
              QStringList& values)
 {
@@ -58,6 +82,18 @@ void collect(const TagMap& map, const QVector<DcmTagKey>& path, int depth, const
         const auto& sequence = static_cast<const TagSequence&>(*element);
         for (int i = 0; i < sequence.numItems(); ++i)
             collect(sequence.itemToRead(i), path, depth + 1, characterSet, values);
+        return;
+    }
+    if (element->vr() == VrCode::FD) {
+        appendReals<double>(element->value(), values);
+        return;
+    }
+    if (element->vr() == VrCode::FL) {
+        appendReals<float>(element->value(), values);
+        return;
+    }
+    if (element->vr() == VrCode::AT) {
+        appendTags(element->value(), values);
         return;
     }
     QByteArray bytes;

@@ -90,8 +90,9 @@ QByteArray ownJson(const TagMap& image, const std::vector<DcmTagKey>& keys, bool
                    const QByteArray& address)
 {
     std::ostringstream json;
+    const std::string values = (address + "/bulkdata").toStdString();
     if (isWhole) {
-        writeDicomJson(json, image, (address + "/bulkdata").toStdString());
+        writeDicomJson(json, image, values);
         return QByteArray::fromStdString(json.str());
     }
     TagMap chosen;
@@ -100,7 +101,7 @@ QByteArray ownJson(const TagMap& image, const std::vector<DcmTagKey>& keys, bool
         if (element != nullptr && !element->markedAsOmitted())
             chosen.putElement(key, element->clone());
     }
-    writeDicomJson(json, chosen, std::string());
+    writeDicomJson(json, chosen, values);
     return QByteArray::fromStdString(json.str());
 }
 

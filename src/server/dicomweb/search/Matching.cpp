@@ -207,12 +207,15 @@ bool isNumber(DcmEVR vr)
     }
 }
 
-bool matchesNumber(const QString& value, const QString& wanted)
+bool matchesNumber(const QString& value, const QString& wanted, DcmEVR vr)
 {
     bool isValue = false;
     bool isWanted = false;
     const double number = value.toDouble(&isValue);
-    return number == wanted.trimmed().toDouble(&isWanted) && isValue && isWanted;
+    const double asked = wanted.trimmed().toDouble(&isWanted);
+    // Few digits are enough to tell numbers of this VR apart, and nobody knows how many somebody writes.
+    const bool isNear = vr == EVR_FL && static_cast<float>(number) == static_cast<float>(asked);
+    return isValue && isWanted && (number == asked || isNear);
 }
 
 bool matchesOne(const QString& value, const QString& wanted, DcmEVR vr, std::optional<int> zone)
@@ -225,7 +228,7 @@ bool matchesOne(const QString& value, const QString& wanted, DcmEVR vr, std::opt
     if (vr == EVR_PN)
         return matchesName(value, wanted);
     if (isNumber(vr))
-        return matchesNumber(value, wanted);
+        return matchesNumber(value, wanted, vr);
     if (takesWildcards(vr))
         return matchesText(value, wanted, vr);
     return value == wanted.trimmed();

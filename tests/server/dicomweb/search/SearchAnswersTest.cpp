@@ -25,6 +25,10 @@ protected:
                                  "StudyDate=20240101|StudyTime=233000|TimezoneOffsetFromUTC=+0100|"
                                  "StudyDescription=Head CT|Modality=CT|SeriesNumber=2|BodyPartExamined=HEAD")
                            .with(DCM_InstanceNumber, QByteArray(sop).right(1))
+                           .with(DCM_InstitutionAddress, "Main Road 1\r\nTown")
+                           .with(DCM_FrameIncrementPointer, "(0018,1063)")
+                           .with(DCM_SelectorFLValue, "-2.59096709e-07")
+                           .with(DCM_SelectorFDValue, "0.123456789")
                            .withItem(DCM_RequestAttributesSequence,
                                      anItem().with("ScheduledProcedureStepID=STEP1|RequestedProcedureID=RP1"))
                            .withItem(DCM_RequestAttributesSequence,
@@ -153,6 +157,10 @@ const std::pair<const char*, const char*> kSearches[] = {
     {"SeriesNumber=1e30", ""},
     {"BodyPartExamined=HEAD&PatientID=P1", "1.1"},
     {"BodyPartExamined=FOOT&PatientID=P1", ""},
+    {"SelectorFDValue=0.123456789&PatientID=P1", "1.1"},
+    {"SelectorFDValue=0.123457&PatientID=P1", ""},
+    {"SelectorFLValue=-2.59096709e-07&PatientID=P1", "1.1"},
+    {"FrameIncrementPointer=00181063&PatientID=P1", "1.1"},
     {"SOPClassesInStudy=1.2.840.10008.5.1.4.1.1.7&StudyInstanceUID=1.1,2", "1.1 2"},
     {"orderby=PatientName", "2 1.1"},
     {"orderby=-PatientID", "1.1 2"},
@@ -196,6 +204,16 @@ TEST_P(SearchAnswers, FindWhatTheyShow)
                 << key << ' ' << shown.toStdString();
         }
     }
+}
+
+TEST_P(SearchAnswers, FindEachModalityOfASeriesOfSeveral)
+{
+    store("8", image("8.1.1", "8", "8.1").with(DCM_Modality, "PT\\CT"));
+    add();
+    EXPECT_EQ(jsonAt(list("studies"), "0/00080061/Value"),
+              (QJsonArray{QStringLiteral("CT"), QStringLiteral("PT")}));
+    for (const char* modality : {"CT", "PT"})
+        EXPECT_EQ(studies("ModalitiesInStudy=" + QByteArray(modality)), "8") << modality;
 }
 
 const std::pair<const char*, const char*> kNames[] = {
@@ -343,8 +361,16 @@ TEST_P(SearchAnswers, AreCompressedForThoseWhoTakeIt)
 
 TEST_P(SearchAnswers, SayWhereValuesThatTheyLeaveOutAre)
 {
-    store("3.1", image("3.1", "3", "3.9").withLong(DCM_PatientComments, 3000));
+    store("3.1", image("3.1", "3", "3.9")
+                     .withLong(DCM_PatientComments, 3000)
+                     .withItem(DCM_ProcedureCodeSequence,
+                               anItem().with("CodeValue=C1").withLong(DCM_CodeMeaning, 3000)));
     add();
+    const QByteArray place = "0/00081032/Value/0/00080104/BulkDataURI";
+    EXPECT_EQ(textAt(list("studies/3/instances?includefield=ProcedureCodeSequence"), place),
+              "http://host/dicom-web/studies/3/series/3.9/instances/3.1/bulkdata/00081032/0/00080104");
+    EXPECT_EQ(textAt(list("studies?includefield=all"), "0/00081032/Value/0/00080100/Value/0"), "C1");
+    EXPECT_EQ(textAt(list("studies?includefield=all"), place), "") << "of a study it has none";
     EXPECT_EQ(textAt(list("studies/3/instances?includefield=all"), "0/00104000/BulkDataURI"),
               "http://host/dicom-web/studies/3/series/3.9/instances/3.1/bulkdata/00104000");
 }

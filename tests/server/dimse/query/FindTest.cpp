@@ -1,4 +1,6 @@
 #include "QueriedArchive.h"
+#include "server/dicomweb/search/AnswerObject.h"
+#include "server/dimse/QueryAnswer.h"
 #include "server/dimse/QueryIdentifier.h"
 #include "support/RealFiles.h"
 
@@ -24,7 +26,7 @@ protected:
                                "StudyDescription=Head|";
         const std::tuple<const char*, const char*, QByteArray> kImages[] = {
             {"1.1", "1", muller + "Modality=CT|InstanceNumber=1|PatientWeight=70.5"},
-            {"1.2", "1", muller + "Modality=SR"},
+            {"1.2", "1", muller + "Modality=SR|InstanceNumber=1000000"},
             {"2.1", "2", doe + "StudyTime=0100"},
             {"3.1", "3", doe + "StudyTime=1200|AccessionNumber=A7"},
         };
@@ -61,6 +63,7 @@ const std::tuple<const char*, const char*, DcmTagKey, const char*> kQuestions[] 
      "1.1 1.2"},
     {"SERIES", "StudyDescription=*ead|AccessionNumber=A7|SeriesInstanceUID", DCM_SeriesInstanceUID, "3.1"},
     {"IMAGE", "SOPInstanceUID=1.1|InstanceNumber", DCM_InstanceNumber, "1"},
+    {"IMAGE", "SOPInstanceUID=1.2|InstanceNumber", DCM_InstanceNumber, "1000000"},
     {"SERIES", "SeriesInstanceUID|Modality=CT", DCM_QueryRetrieveLevel, "SERIES"},
     {"STUDY", "StudyInstanceUID=9", DCM_StudyInstanceUID, ""},
 };
@@ -150,6 +153,57 @@ TEST(QueryIdentifier, ReadsValuesInTheCharactersThatItNames)
         ASSERT_EQ(identifier.search.conditions.size(), 1U) << row[0];
         EXPECT_EQ(identifier.search.conditions[0].list, QVector<QString>{QString::fromUtf8(row[2])})
             << row[0];
+    }
+}
+
+TEST(QueryIdentifier, ReadsNumbersAndTagsAsSearchesHaveThem)
+{
+    DcmDataset dataset(anItem().with(DCM_QueryRetrieveLevel, "STUDY").build());
+    Dimse::QueryIdentifier identifier;
+    QString reason;
+    dataset.putAndInsertTagKey(DCM_FrameIncrementPointer, DCM_FrameTime);
+    dataset.putAndInsertFloat64(DCM_SelectorFDValue, 6.02876349523266e+184);
+    EXPECT_TRUE(Dimse::QueryIdentifier::read(dataset, Dimse::QueryRoot::Study, identifier, reason));
+    ASSERT_EQ(identifier.search.conditions.size(), 2U);
+    EXPECT_EQ(identifier.search.conditions[0].value, QStringLiteral("00181063"));
+    EXPECT_EQ(identifier.search.conditions[1].value, QStringLiteral("6.02876349523266e+184"));
+}
+
+/// An attribute as it was found, and the VR and text of it in an answer.
+const std::tuple<DcmTagKey, const char*, const char*, const char*> kFound[] = {
+    {DCM_SeriesNumber, R"({"vr":"IS","Value":[1000000,2147483647]})", "IS", "1000000\\2147483647"},
+    {DCM_PatientWeight, R"({"vr":"DS","Value":[70.5,1e+25]})", "DS", "70.5\\1e+25"},
+    {DCM_FrameIncrementPointer, R"({"vr":"AT","Value":["00181063"]})", "AT", "(0018,1063)"},
+    {DCM_PatientSize, R"({"vr":"FD","Value":[1.75]})", "DS", "1.75"},
+    {{0x0009, 0x1001}, R"({"vr":"UL","Value":[4294967295]})", "UL", "4294967295"},
+    {DCM_OtherPatientIDsSequence, R"({"vr":"FL","Value":[1,2]})", "SQ", ""},
+};
+
+TEST(QueryAnswer, GivesValuesAsTheyWereFound)
+{
+    for (const auto& [key, element, vr, text] : kFound) {
+        Dimse::QueryIdentifier question;
+        question.level = Dimse::QueryLevel::Image;
+        question.keys = {{key, {}}, {DCM_SelectorFDValue, {}}};
+        DcmDataset answer;
+        fillAnswer(question,
+                   "{\"" + DicomWeb::keyName(key) + "\":" + element +
+                       R"(,"00720074":{"vr":"FD","Value":[5.35005485831951e+134,"-Infinity"]}})",
+                   "SCP", answer);
+        DcmElement* given = nullptr;
+        OFString value;
+        Float64 number = 0;
+        ASSERT_TRUE(answer.findAndGetElement(key, given).good());
+        EXPECT_STREQ(DcmVR(given->ident()).getVRName(), vr);
+        if (given->ident() == EVR_SQ)
+            EXPECT_EQ(static_cast<DcmSequenceOfItems*>(given)->card(), 0U);
+        else
+            EXPECT_TRUE(given->getOFStringArray(value).good());
+        EXPECT_EQ(value, text);
+        EXPECT_TRUE(answer.findAndGetFloat64(DCM_SelectorFDValue, number).good());
+        EXPECT_EQ(number, 5.35005485831951e+134);
+        EXPECT_TRUE(answer.findAndGetFloat64(DCM_SelectorFDValue, number, 1).good());
+        EXPECT_EQ(number, -std::numeric_limits<double>::infinity());
     }
 }
 
