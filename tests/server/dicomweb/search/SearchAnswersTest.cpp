@@ -135,6 +135,7 @@ const std::pair<const char*, const char*> kSearches[] = {
     {"StudyDescription=Head CT", "1.1"},
     {"ModalitiesInStudy=CT,MR", "1.1"},
     {"ModalitiesInStudy=C*", "1.1"},
+    {"ModalitiesInStudy=CT&StudyDate=20240102-", ""},
     {"ModalitiesInStudy=ct", ""},
     {"StudyDate=20240101-20240102&StudyTime=2200-0100", "1.1"},  // one range of moments
     {"StudyDate=20240101-20240102&StudyTime=2345-0100", ""},
@@ -142,6 +143,7 @@ const std::pair<const char*, const char*> kSearches[] = {
     {"StudyDate=20240102&timezone=%2B0200", "1.1"},  // half past midnight there
     {"StudyDate=20240101&timezone=%2B0200", ""},
     {"StudyDate=20240101&timezone=%2B0000", "1.1"},
+    {"StudyDate=-20240101", "1.1"},
     {"StudyInstanceUID=1.1%5C2", "1.1 2"},
     {"StudyInstanceUID=1.1&StudyInstanceUID=1.1", "1.1"},
     {"StudyInstanceUID=1.1&StudyInstanceUID=2", ""},
@@ -149,6 +151,11 @@ const std::pair<const char*, const char*> kSearches[] = {
     {"RequestAttributesSequence.ScheduledProcedureStepID=STEP*&PatientID=P1", "1.1"},
     {"00400275.00400009=STEP3", ""},
     {"SOPInstanceUID=2.1.1", "2"},
+    {"PatientID=P1", "1.1"},
+    {"PatientID=p1", ""},
+    {"PatientID=p*", "1.1"},
+    {"SeriesInstanceUID=1.1.2&Modality=SR", "1.1"},
+    {"SeriesInstanceUID=1.1.2&Modality=CT", ""},
     {"SeriesNumber=02", "1.1"},
     {"SeriesNumber=1e30", ""},
     {"BodyPartExamined=HEAD&PatientID=P1", "1.1"},
