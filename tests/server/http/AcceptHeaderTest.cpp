@@ -43,6 +43,17 @@ TEST(AcceptHeader, ChoosesWhatIsMostWelcome)
         EXPECT_EQ(AcceptHeader(QByteArray(accept)).choose(kOffers), offer) << accept;
 }
 
+TEST(AcceptHeader, TellsTheTransferSyntaxBestFirst)
+{
+    const AcceptHeader accept(
+        "multipart/related; type=application/dicom; transfer-syntax=1.2.840.10008.1.2.4.50; q=0.3,"
+        "multipart/related; type=\"application/dicom\"; transfer-syntax=\"1.2.840.10008.1.2.1\"");
+    ASSERT_EQ(accept.ranges().size(), 2);
+    EXPECT_EQ(accept.ranges()[0].transferSyntax, "1.2.840.10008.1.2.1");
+    EXPECT_EQ(accept.ranges()[1].transferSyntax, "1.2.840.10008.1.2.4.50");
+    EXPECT_EQ(accept.ranges()[1].quality, 300);
+}
+
 TEST(AcceptHeader, KnowsContentCodings)
 {
     const std::tuple<const char*, bool> cases[] = {

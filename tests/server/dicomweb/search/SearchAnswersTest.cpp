@@ -140,6 +140,7 @@ const std::pair<const char*, const char*> kSearches[] = {
     {"StudyDate=20240101-20240102&StudyTime=2200-0100", "1.1"},  // one range of moments
     {"StudyDate=20240101-20240102&StudyTime=2345-0100", ""},
     {"StudyDate=20240101&StudyTime=2200-", "1.1"},
+    {"StudyDate=20231231-20240101&StudyTime=2200-2300", ""},
     {"StudyDate=20240102&timezone=%2B0200", "1.1"},  // half past midnight there
     {"StudyDate=20240101&timezone=%2B0200", ""},
     {"StudyDate=20240101&timezone=%2B0000", "1.1"},
