@@ -258,8 +258,8 @@ class Attack:
 
 
 def can_trace():
-    return shutil.which("strace") and subprocess.run(["strace", "-o", "/dev/null", "true"], stderr=subprocess.DEVNULL,
-                                                     check=False).returncode == 0
+    return shutil.which("strace") and subprocess.run(["strace", "--seccomp-bpf", "-f", "-o", "/dev/null", "true"],
+                                                     stderr=subprocess.DEVNULL, check=False).returncode == 0
 
 
 def main():

@@ -6,23 +6,14 @@ import os
 import re
 import shutil
 import signal
-import socket
 import subprocess
+import sys
 import threading
 
-# Refuses to run as an administrator, and goes with us.
-POSTGRES = """set -- /usr/lib/postgresql/*/bin
-if [ $(id -u) = 0 ]; then chown nobody . && S="--reuid nobody --regid nogroup --clear-groups"; fi
-[ -d data ] || setpriv --pdeathsig QUIT $S $1/initdb -D data -U kdd -A trust -E UTF8 --no-sync --locale=C.UTF-8 >initdb.log &&
-exec setpriv --pdeathsig QUIT $S $1/postgres -D data -k $PWD -c listen_addresses= -c max_connections=300 -c fsync=off"""
+sys.path.insert(0, os.path.join(os.path.dirname(os.path.abspath(__file__)), "../../bench"))
+from servers import free_port, start_postgres  # noqa: E402
 
 ANSWERS = 8  # [MiB], of the folder of kept answers
-
-
-def free_port():
-    with socket.socket() as listener:
-        listener.bind(("127.0.0.1", 0))
-        return listener.getsockname()[1]
 
 
 def nginx_block(page):
@@ -48,14 +39,11 @@ class DeployedSite:
         self.certificate = os.path.join(folder, "tls.pem")
         self.processes = {}
         self.log = open(os.path.join(folder, "log"), "ab")
+        self.database_is_there = threading.Event()
         self.environment = dict(
             os.environ, KDD_STORE=self.store, KDD_FREE_SPACE="0", KDD_SETTLE_SECONDS="3",
             KDD_SERVER_PROXIES="127.0.0.1", KDD_FILE_DIGESTS="1", KDD_CHECK_RATE="4", KDD_CHECK_HOURS="0",
-            KDD_ANSWERS_SIZE=str(ANSWERS), KDD_DATABASE="postgresql://kdd@/postgres?host=" + self.database_folder())
-        self.database_is_there = threading.Event()
-        os.makedirs(self.database_folder())
-        os.chmod(self.folder, 0o755)
-        self.start_database()
+            KDD_ANSWERS_SIZE=str(ANSWERS), KDD_DATABASE=self.start_database())
         self.run("build")
         self.start_nginx(page)
 
@@ -64,9 +52,6 @@ class DeployedSite:
         now = datetime.datetime.now().isoformat(" ", "milliseconds")
         self.log.write(f"{now} soak {text}\n".encode())
         self.log.flush()
-
-    def database_folder(self):
-        return os.path.join(self.folder, "pg")
 
     def run(self, *arguments, **more):
         """A command of the tool, which has to succeed."""
@@ -77,16 +62,10 @@ class DeployedSite:
         return done.stdout
 
     def start_database(self):
-        server = subprocess.Popen(["sh", "-c", POSTGRES], cwd=self.database_folder(), stdout=subprocess.PIPE, stderr=subprocess.STDOUT)
-        self.processes["postgres"] = server
-        said = b""
-        while b"ready to accept connections" not in said:
-            line = server.stdout.readline()
-            if not line:
-                raise SystemExit("PostgreSQL did not start: " + said.decode())
-            said += line
+        """Its address."""
+        self.processes["postgres"], address = start_postgres(self.folder, "-c max_connections=300")
         self.database_is_there.set()
-        threading.Thread(target=lambda: [None for _ in server.stdout], daemon=True).start()
+        return address
 
     def start_nginx(self, page):
         subprocess.run(["openssl", "req", "-x509", "-newkey", "rsa:2048", "-nodes", "-days", "2", "-subj", "/CN=localhost",

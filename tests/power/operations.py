@@ -12,7 +12,7 @@ import subprocess
 import sys
 
 sys.path.insert(0, os.path.join(os.path.dirname(os.path.abspath(__file__)), "../crash"))
-from crash import OPERATIONS, Operation, Site  # noqa: E402
+from crash import OPERATIONS, Operation, Site, can_trace  # noqa: E402,F401
 
 JOURNAL_HEADER = 20  # bytes in front of the content
 COMMANDS = OPERATIONS + [Operation("restore", ["add DAY", "BACKUP", "qa EDIT --study STUDY --image IMAGE",

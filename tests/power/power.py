@@ -23,7 +23,7 @@ import tempfile
 sys.dont_write_bytecode = True
 import disk  # noqa: E402
 import recording  # noqa: E402
-from operations import COMMANDS, Arrival, Command, PowerSite  # noqa: E402
+from operations import COMMANDS, Arrival, Command, PowerSite, can_trace  # noqa: E402
 
 
 def run(subject, name, wanted):
@@ -84,7 +84,7 @@ def main():
     parser.add_argument("--keep", action="store_true", help="end at the first fault, and leave the state there")
     parser.add_argument("--folder")
     wanted = parser.parse_args()
-    if not recording.can_trace():
+    if not can_trace():
         print("Skipped: there is no strace, or it may not trace here")
         raise SystemExit(77)
     faults = 0

@@ -1,7 +1,6 @@
 """What a program asked of its disk, in order, by strace."""
 import collections
 import re
-import subprocess
 
 CALLS = """open openat creat write pwrite64 writev pwritev pwritev2 ftruncate truncate fallocate rename renameat renameat2 link
 linkat symlink symlinkat unlink unlinkat rmdir mkdir mkdirat fsync fdatasync sync syncfs sync_file_range copy_file_range sendfile
@@ -80,11 +79,3 @@ def read(log):
                 continue
             calls.append(Call(name.decode(), split(done[1]), int(done[2], 0), decoded(done[3]) if done[3] else b"", begun))
     return calls
-
-
-def can_trace():
-    try:
-        return subprocess.run(["strace", "--seccomp-bpf", "-f", "-o", "/dev/null", "true"], stderr=subprocess.DEVNULL,
-                              check=False).returncode == 0
-    except OSError:
-        return False

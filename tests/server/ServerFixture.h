@@ -3,10 +3,10 @@
 #include "server/Server.h"
 #include "server/http/Client.h"
 #include "support/DatasetBuilder.h"
+#include "support/FileContent.h"
 #include "support/LogCapture.h"
 #include "support/TemporaryStore.h"
 
-#include <QDirIterator>
 #include <QJsonArray>
 #include <QJsonDocument>
 #include <QJsonObject>
@@ -88,16 +88,6 @@ inline int runTool(const QString& store, const QByteArray& database, const QStri
     return process.exitCode();
 }
 
-/// The files of objects below a folder.
-inline QStringList objectsBelow(const QString& folder)
-{
-    QStringList names;
-    QDirIterator files(folder, {QStringLiteral("*.dcm")}, QDir::Files, QDirIterator::Subdirectories);
-    while (files.hasNext())
-        names.append(files.next());
-    return names;
-}
-
 /// A server over a store of its own. It takes nothing and has no associations until a test's settings say so.
 class ServerFixture : public testing::Test
 {
@@ -145,7 +135,10 @@ protected:
         return Kxg::Catalogue::open(mDatabase, result);
     }
 
-    QStringList storedFiles() const { return objectsBelow(mStore.filePath("objects")); }
+    QStringList storedFiles() const
+    {
+        return filesBelow(mStore.filePath("objects"), {QStringLiteral("*.dcm")});
+    }
 
     /// Runs the tool over the same archive, which has to succeed.
     void kdd(const QByteArray& arguments) const

@@ -1,8 +1,8 @@
 #pragma once
 
 #include "platform/database/Kxg.h"
+#include "support/Engines.h"
 #include "support/LogCapture.h"
-#include "support/PostgresServer.h"
 #include "support/TemporaryStore.h"
 
 #include <QThread>
@@ -13,17 +13,11 @@ namespace Kdd
 {
 
 /// Tests for each engine that an image database may have, with a new one that all questions go to.
-class EngineTest : public testing::TestWithParam<const char*>
+class EngineTest : public testing::TestWithParam<Engine>
 {
-public:
-    static auto engines() { return testing::Values("Sqlite", "Postgres"); }
-    static std::string nameOf(const testing::TestParamInfo<const char*>& engine) { return engine.param; }
-
 protected:
     EngineTest() { Kxg::SetDatabaseServer(mAddress); }
     ~EngineTest() override { Kxg::SetDatabaseServer(QByteArray()); }
-
-    bool isSqlite() const { return QByteArray(GetParam()) == "Sqlite"; }
 
     /// Looks until it is so, for as long as it takes on a busy machine.
     template <typename Condition>
@@ -36,8 +30,7 @@ protected:
 
     LogCapture mLog;
     TemporaryStore mStore;
-    QByteArray mAddress =
-        isSqlite() ? "sqlite:" + mStore.filePath("kdd.sqlite").toUtf8() : newPostgresDatabase();
+    QByteArray mAddress = newDatabase(GetParam(), mStore.filePath("kdd.sqlite"));
 };
 
 }  // namespace Kdd

@@ -1,6 +1,7 @@
 #include "support/FileContent.h"
 
 #include <QDir>
+#include <QDirIterator>
 #include <QFile>
 #include <QFileInfo>
 #include <QtEndian>
@@ -25,6 +26,16 @@ QByteArray fileContent(const QString& path)
 {
     QFile file(path);
     return file.open(QIODevice::ReadOnly) ? file.readAll() : QByteArray("(no file)");
+}
+
+QStringList filesBelow(const QString& folder, const QStringList& patterns)
+{
+    QStringList files;
+    QDirIterator all(folder, patterns, QDir::Files | QDir::Hidden, QDirIterator::Subdirectories);
+    while (all.hasNext())
+        files.append(all.next());
+    files.sort();
+    return files;
 }
 
 void flipBit(const QString& path, qint64 byte, Clock clock)

@@ -2,6 +2,7 @@
 
 #include <QByteArray>
 #include <QString>
+#include <QStringList>
 #include <QTemporaryDir>
 
 #include <gtest/gtest.h>
@@ -14,6 +15,9 @@ void putFile(const QString& path, const QByteArray& content);
 
 /// "(no file)" when there is none.
 QByteArray fileContent(const QString& path);
+
+/// All files below a folder, hidden ones too, sorted; with patterns those whose names fit one of them.
+QStringList filesBelow(const QString& folder, const QStringList& patterns = {});
 
 /// Changes a bit, as a disk does it, which leaves the time as it was, or as a program.
 enum class Clock { Kept, Now };

@@ -1,8 +1,6 @@
 #pragma once
 
-#include <QDirIterator>
-#include <QString>
-#include <QStringList>
+#include "support/FileContent.h"
 
 namespace Kdd
 {
@@ -17,12 +15,7 @@ inline QString realFilesFolder()
 /// All files below a folder of it, sorted.
 inline QStringList realFiles(const char* folder)
 {
-    QStringList files;
-    const QString path = realFilesFolder() + QLatin1Char('/') + QLatin1String(folder);
-    for (QDirIterator it(path, QDir::Files, QDirIterator::Subdirectories); it.hasNext();)
-        files.append(it.next());
-    files.sort();
-    return files;
+    return filesBelow(realFilesFolder() + QLatin1Char('/') + QLatin1String(folder));
 }
 
 }  // namespace Kdd

@@ -1,8 +1,5 @@
-#include "ServedStore.h"
 #include "kddlib/tagfile/TagFile.h"
-#include "support/Setting.h"
-
-#include <QThread>
+#include "server/faults/Served.h"
 
 using namespace Kdd;
 
@@ -10,7 +7,7 @@ namespace
 {
 
 /// What disks and backups do to files, and what the commands tell of it.
-class Proof : public ServedStore
+class Proof : public Served
 {
 protected:
     QString tagFile(const char* study) const
@@ -65,22 +62,15 @@ TEST_F(Proof, AServerLooksInTheBackground)
     flipBit(tagFile("1.3"), 40);
     const Setting rate("KDD_CHECK_RATE", "100");
     const Setting heals("KDD_CHECK_HEALS", "1");
-    const auto server = start("--json serve --listen 127.0.0.1:0 --status 127.0.0.1:0");
-    const QByteArray status = jsonAt(toldBy(*server), "status").toString().toLatin1();
+    serve();
     QByteArray counted;
-    const auto isDone = [&] {
+    EXPECT_TRUE(comesTrue([&] {
+        counted = status("/metrics").body;
         return counted.contains("kdd_check_studies 2\n") && counted.contains("kdd_check_faulty_studies 1\n");
-    };
-    for (int look = 0; look < 3000 && !isDone(); ++look) {
-        counted = Client(status).ask("/metrics").body;
-        QThread::msleep(10);
-    }
-    EXPECT_TRUE(counted.contains("kdd_check_faulty_studies 1\n")) << counted.toStdString();
+    })) << counted.toStdString();
     EXPECT_TRUE(counted.contains("kdd_check_healed 1\n")) << counted.toStdString();
-    server->terminate();
-    const Answer answer = finish(*server);
-    EXPECT_EQ(answer.exitCode, 0);
-    EXPECT_TRUE(answer.err.contains("/images/1 is damaged")) << answer.err.toStdString();
+    EXPECT_EQ(end(), 0);
+    EXPECT_TRUE(fileContent(path("log")).contains("/images/1 is damaged"));
     EXPECT_EQ(kdd("verify --all").exitCode, 0);
 }
 
@@ -89,21 +79,20 @@ TEST_F(Proof, AServerThatProvesServesNoWrongPreview)
     const Setting proves("KDD_SERVER_PROVES", "1");
     save("1", anImage("1").inStudy("1.2"));
     addImages();
-    Addresses addresses;
-    const auto server = serve(addresses);
-    const auto status = [&] { return Client(addresses.http).ask("/dicom-web/studies/1.2/metadata").status; };
-    EXPECT_EQ(status(), 200);
+    serve();
+    const auto served = [this] { return get("studies/1.2/metadata").status; };
+    EXPECT_EQ(served(), 200);
     // Stored without a checksum, as previews are: only the digest tells.
     EXPECT_EQ(kdd("--compression none build --all --again").exitCode, 0);
-    EXPECT_EQ(status(), 200);
+    EXPECT_EQ(served(), 200);
     const qint64 name = fileContent(tagFile("1.2")).indexOf("1.2.840.10008.");
     ASSERT_GT(name, 0);
     flipBit(tagFile("1.2"), name);
-    EXPECT_EQ(status(), 500);
+    EXPECT_EQ(served(), 500);
     EXPECT_EQ(kdd("verify --all --heal --json").number("healed"), 1);
-    EXPECT_EQ(status(), 200);
-    server->terminate();
-    EXPECT_TRUE(finish(*server).err.contains("is damaged and not served"));
+    EXPECT_EQ(served(), 200);
+    EXPECT_EQ(end(), 0);
+    EXPECT_TRUE(fileContent(path("log")).contains("is damaged and not served"));
 }
 
 TEST_F(Proof, ObjectsThatArriveAreDigestedAsTheyPass)
@@ -111,11 +100,9 @@ TEST_F(Proof, ObjectsThatArriveAreDigestedAsTheyPass)
     save("1", anImage("1").inStudy("1.2"));
     {
         const Setting digests("KDD_FILE_DIGESTS", "1");
-        Addresses addresses;
-        const auto server = serve(addresses);
-        EXPECT_EQ(send(addresses, bytes("1")), 200);
-        server->terminate();
-        EXPECT_EQ(finish(*server).exitCode, 0);
+        serve("--stow");
+        EXPECT_EQ(ask("POST", "studies", "application/dicom", bytes("1")).status, 200);
+        EXPECT_EQ(end(), 0);
     }
     const Answer deep = kdd("verify --all --deep --json");
     EXPECT_EQ(deep.exitCode, 0) << deep.err.toStdString();

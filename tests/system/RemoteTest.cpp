@@ -1,12 +1,8 @@
-#include "CommandLineFixture.h"
 #include "kddlib/tagfile/TagFile.h"
-#include "server/http/Client.h"
+#include "server/faults/Served.h"
 #include "support/HttpServer.h"
 #include "support/ObjectServer.h"
-#include "support/Setting.h"
 #include "support/TreeText.h"
-
-#include <QDirIterator>
 
 #include <atomic>
 
@@ -16,18 +12,14 @@ namespace
 {
 
 /// An archive whose images stay behind a server.
-class Remote : public CommandLine
+class Remote : public Served
 {
 protected:
     /// Copies what is below the folder of images to the server, and writes the list of it.
     void publish()
     {
-        QStringList files;
-        for (QDirIterator it(images(), QDir::Files, QDirIterator::Subdirectories); it.hasNext();)
-            files.append(it.next());
         // As a folder is looked through, so that of several files of one image the same one is the last.
-        files.sort();
-        for (const QString& path : qAsConst(files)) {
+        for (const QString& path : filesBelow(images())) {
             const QByteArray name =
                 path.mid(images().size() + 1).replace(QLatin1Char('/'), QLatin1Char('.')).toLatin1();
             mServer.addFile(name.constData(), fileContent(path));
@@ -60,19 +52,14 @@ protected:
         return text.toStdString();
     }
 
-    void expectServed() const
+    void expectServed()
     {
-        const std::unique_ptr<QProcess> server = start("--json serve --listen 127.0.0.1:0");
-        Client client(jsonAt(toldBy(*server), "address").toString().toLatin1());
-        EXPECT_EQ(QJsonDocument::fromJson(client.ask("/dicom-web/studies/1.2/metadata").body).array().size(),
-                  4);
-        EXPECT_EQ(client
-                      .ask("/dicom-web/studies/1.2/series/1.2.5/instances/5/frames/1",
-                           "Accept: application/octet-stream\r\n")
-                      .body,
-                  QByteArray("\1\0\2\0\3\0\4\0", 8));
-        server->terminate();
-        EXPECT_EQ(finish(*server).exitCode, 0);
+        serve();
+        EXPECT_EQ(jsonAt(get("studies/1.2/metadata").body).toArray().size(), 4);
+        EXPECT_EQ(
+            get("studies/1.2/series/1.2.5/instances/5/frames/1", "Accept: application/octet-stream\r\n").body,
+            QByteArray("\1\0\2\0\3\0\4\0", 8));
+        EXPECT_EQ(end(), 0);
     }
 
     NginxServer mServer;
@@ -83,10 +70,7 @@ TEST_F(Remote, StudiesAreWhatTheyAreFromLocalFiles)
 {
     ASSERT_EQ(kdd("sample --images 60 @made").exitCode, 0);
     // In one folder, for then both are in the same order.
-    QStringList files;
-    for (QDirIterator it(file("made"), QDir::Files, QDirIterator::Subdirectories); it.hasNext();)
-        files.append(it.next());
-    for (const QString& path : qAsConst(files)) {
+    for (const QString& path : filesBelow(file("made"))) {
         const QString name = path.mid(file("made").size() + 1).replace(QLatin1Char('/'), QLatin1Char('.'));
         ASSERT_TRUE(QFile::rename(path, file(name.toUtf8().constData())));
     }

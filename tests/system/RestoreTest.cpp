@@ -1,4 +1,4 @@
-#include "ServedStore.h"
+#include "server/faults/Served.h"
 
 using namespace Kdd;
 
@@ -16,20 +16,18 @@ struct Restored
     int exitCode;
 };
 
-class Restore : public ServedStore, public testing::WithParamInterface<Restored>
+class Restore : public Served, public testing::WithParamInterface<Restored>
 {
 protected:
-    void store(const std::vector<int>& images) const
+    void store(const std::vector<int>& images)
     {
-        Addresses addresses;
-        const auto server = serve(addresses);
+        serve("--stow");
         for (const int number : images) {
             const QByteArray uid = "1.2.3." + QByteArray::number(number);
             save(uid.constData(), anImage(uid).with(DCM_PatientName, "Doe^J"));
-            EXPECT_EQ(send(addresses, bytes(uid.constData())), 200);
+            EXPECT_EQ(ask("POST", "studies", "application/dicom", bytes(uid.constData())).status, 200);
         }
-        server->terminate();
-        EXPECT_EQ(finish(*server).exitCode, 0);
+        EXPECT_EQ(end(), 0);
         EXPECT_EQ(kdd("build --settle").exitCode, 0);
     }
 

@@ -93,11 +93,6 @@ protected:
             file.series = file.study + '.' + std::to_string(pick(2));
         file.patient = "Doe^" + std::to_string(pick(4));
         file.number = std::to_string(pick(50));
-        put(path, file);
-    }
-
-    void put(const std::string& path, const ModelFile& file)
-    {
         tellFile("write ", path, file);
         save(path, file);
         setClock(path);
@@ -227,12 +222,8 @@ protected:
     {
         const std::string study = pickStudy();
         const unsigned what = pick(5);
-        remove(study, what == 1 ? study + '.' + std::to_string(pick(2)) : "",
-               what > 1 ? "9." + std::to_string(pick(10)) : "");
-    }
-
-    void remove(const std::string& study, const std::string& series, const std::string& image)
-    {
+        const std::string image = what > 1 ? "9." + std::to_string(pick(10)) : "";
+        const std::string series = what == 1 ? study + '.' + std::to_string(pick(2)) : "";
         tell("delete study " + study + " series " + series + " image " + image);
         const ArchiveNode node = {QByteArray::fromStdString(study), QByteArray::fromStdString(series),
                                   QByteArray::fromStdString(image)};
@@ -282,8 +273,10 @@ protected:
         switch (pick(6)) {
         case 0:
         case 1:
-            if (present != nullptr)
-                keepCopy(study);
+            if (present == nullptr)
+                return;
+            tell("keep a copy of the tag file of " + study);
+            mCopies[study] = {bytesOf(study), *present};
             break;
         case 2:
             if (mCopies.count(study) > 0 && mCopies[study].bytes != bytesOf(study))
@@ -306,14 +299,10 @@ protected:
         default:
             if (present == nullptr)
                 return;
-            cut(study, static_cast<int>(pick(60)));
+            tell("cut the tag file of " + study);
+            putFile(tagFilePath(study), bytesOf(study).left(static_cast<int>(pick(60))));
+            mModel.spoil(study, nullptr, true);
         }
-    }
-
-    void keepCopy(const std::string& study)
-    {
-        tell("keep a copy of the tag file of " + study);
-        mCopies[study] = {bytesOf(study), *mModel.tagFile(study)};
     }
 
     void restore(const std::string& study)
@@ -338,13 +327,6 @@ protected:
             else if (mModel.isTrusted(study))
                 mWritten[study] = bytesOf(study);
         }
-    }
-
-    void cut(const std::string& study, int length)
-    {
-        tell("cut the tag file of " + study);
-        putFile(tagFilePath(study), bytesOf(study).left(length));
-        mModel.spoil(study, nullptr, true);
     }
 
     LogCapture mLog;

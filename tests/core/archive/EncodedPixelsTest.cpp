@@ -1,16 +1,15 @@
 #include "core/archive/WholeDataset.h"
 #include "kddlib/Limits.h"
+#include "kddlib/net/dicom/DicomFileReader.h"
 #include "kddlib/tagmodel/TagMap.h"
 #include "support/DatasetBuilder.h"
 #include "support/FileContent.h"
-#include "support/RealImage.h"
 
 #include <dcmtk/dcmdata/dcrledrg.h>
 #include <dcmtk/dcmjpeg/djdecode.h>
 #include <dcmtk/dcmjpls/djdecode.h>
 #include <gtest/gtest.h>
 
-#include <map>
 #include <memory>
 #include <random>
 
@@ -188,38 +187,5 @@ TEST_P(EncodedKinds, HaveTheSamePixelsInEverySyntaxAndFromOneIntoAnother)
 
 INSTANTIATE_TEST_SUITE_P(All, EncodedKinds, testing::ValuesIn(kKinds),
                          [](const auto& each) { return each.param.name; });
-
-using EncodedRealImages = RealImages;
-
-TEST_F(EncodedRealImages, HaveThePixelsThatDecodingGives)
-{
-    std::map<QByteArray, int> made;
-    forEach({"transfer-syntaxes", "multiframe", "modalities"}, [&](const QString& path, RealImage& real) {
-        // Beside long ones, one whose frame is smaller than its image, and one that is no whole codestream.
-        if (real.index.frames() > 20 || real.source.size() > 400000 ||
-            path.endsWith(QLatin1String("multiframe/sc/multiframe.dcm")) ||
-            path.endsWith(QLatin1String("JPEG2000-embedded-sequence-delimiter.dcm")))
-            return;
-        for (const QByteArray& syntax : real.index.encodings()) {
-            ByteSource again(fileIn(syntax, real.source, real.index));
-            FrameIndex encoded;
-            ASSERT_TRUE(encoded.read(again).good());
-            ASSERT_EQ(encoded.frames(), real.index.frames());
-            OFString photometric;
-            const QByteArray whole = pixelsByDcmtk(again.bytes(), photometric);
-            const QByteArray expected =
-                pixelsByDcmtk(fileIn("1.2.840.10008.1.2.1", real.source, real.index), photometric);
-            Uint16 planar = 0;
-            real.file.getDataset()->findAndGetUint16(DCM_PlanarConfiguration, planar);
-            // What is laid out in another way is compared above.
-            if (whole.isNull() || planar == 1 || photometric.find("_422") != OFString_npos)
-                continue;
-            EXPECT_TRUE(whole == expected) << syntax.constData();
-            ++made[syntax];
-        }
-    });
-    for (const char* syntax : {kRle, kJpeg, kJpegLs})
-        EXPECT_GT(made[syntax], 50) << syntax;
-}
 
 }  // namespace

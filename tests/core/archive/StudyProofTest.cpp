@@ -149,14 +149,14 @@ protected:
         }
     }
 
-    const qint64 mStep = isSqlite() ? kStep : 101;  // from one flip to the next [bytes]
+    const qint64 mStep = GetParam() == Engine::Sqlite ? kStep : 101;  // from one flip to the next [bytes]
     QTemporaryDir mFiles;
     WorkObserver mObserver;
     std::unique_ptr<Kxg::Catalogue> mCatalogue = openCatalogue();
     std::string mTold;
 };
 
-INSTANTIATE_TEST_SUITE_P(Engines, StudyProofTest, EngineTest::engines(), EngineTest::nameOf);
+INSTANTIATE_TEST_SUITE_P(Engines, StudyProofTest, kBothEngines, engineName);
 
 // ---- tag files
 

@@ -46,7 +46,7 @@ protected:
     }
 };
 
-INSTANTIATE_TEST_SUITE_P(Engines, StudyWorkersTest, EngineTest::engines(), EngineTest::nameOf);
+INSTANTIATE_TEST_SUITE_P(Engines, StudyWorkersTest, kBothEngines, engineName);
 
 TEST_P(StudyWorkersTest, CompleteWhatWaitsAndWhatComesToWait)
 {
@@ -105,10 +105,10 @@ TEST_P(StudyWorkersTest, GoOnWhenTheDatabaseIsThereAgain)
     StudyWorkers workers(2, kSwift);
     workers.start();
     EXPECT_TRUE(comesTrue([this] { return countWaiting() == 0; }));
-    isSqlite() ? moveFiles(file, away, {"", "-wal", "-shm"}) : stopPostgres();
+    GetParam() == Engine::Sqlite ? moveFiles(file, away, {"", "-wal", "-shm"}) : stopPostgres();
     while (mLog.count("Waiting for the database") == 0)
         QThread::yieldCurrentThread();
-    isSqlite() ? moveFiles(away, file, {"-wal", "-shm", ""}) : startPostgres();
+    GetParam() == Engine::Sqlite ? moveFiles(away, file, {"-wal", "-shm", ""}) : startPostgres();
     index(2, 1);
     EXPECT_TRUE(comesTrue([this] { return countWaiting() == 0; }));
     EXPECT_TRUE(comesTrue([this] { return countWaiting() == 0 && mLog.count("answers again") == 1; }));

@@ -133,6 +133,10 @@ TEST_F(RealFrames, AreThoseOfTheValueWhereNothingIsCompressed)
     forEach([&](const QString& /*path*/, RealImage& real) {
         DcmElement* element = nullptr;
         const qint64 bits = real.index.decodedBits();
+        DcmDataset& dataset = *real.file.getDataset();
+        EXPECT_EQ(real.index.hasPixels(), dataset.tagExists(DCM_PixelData) ||
+                                              dataset.tagExists(DCM_FloatPixelData) ||
+                                              dataset.tagExists(DCM_DoubleFloatPixelData));
         if (real.index.isEncapsulated() || !real.index.hasPixels() || bits == 0)
             return;
         ASSERT_TRUE(real.file.getDataset()->findAndGetElement(real.index.pixelKey(), element).good());

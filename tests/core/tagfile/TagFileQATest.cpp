@@ -5,7 +5,6 @@
 #include "kddlib/tagfile/qa/QAEditor.h"
 #include "kddlib/tagmodel/OwnAttributes.h"
 #include "kddlib/tagmodel/TagElement.h"
-#include "platform/os/FileStatus.h"
 #include "support/FileContent.h"
 #include "support/LogCapture.h"
 
@@ -160,36 +159,6 @@ protected:
         return log.text();
     }
 };
-
-TEST_F(TagFileQA, APreviewTellsWhatIsThenDoneAndTouchesNothing)
-{
-    QAData job = edit({"1", "nobody"}, {{DCM_Rows, QStringLiteral("8")}});
-    job.series = {"1.2", "1.9"};
-    QString message;
-    const QByteArray before = content();
-    ASSERT_TRUE(TagFile::previewQA(job, message));
-    EXPECT_EQ(content(), before);
-    const QAData::Outcome told = job.outcome;
-    EXPECT_EQ(told.asked, 3);
-    EXPECT_EQ(told.changed, 2);
-    EXPECT_EQ(told.notFound, (Uids{"1.9", "nobody"}));
-    ASSERT_EQ(told.images.size(), 2);
-    EXPECT_EQ(told.images.at(0).changes,
-              (QVector<AuditChange>{{DCM_Rows, QStringLiteral("7"), QStringLiteral("8")}}));
-    ASSERT_TRUE(TagFile::applyQA(job, message));
-    EXPECT_EQ(job.outcome.changed, told.changed);
-    EXPECT_EQ(job.outcome.images.at(1).changes, told.images.at(1).changes);
-    job.substitutions = {{DCM_Rows, QStringLiteral("x")}};
-    EXPECT_FALSE(TagFile::previewQA(job, message));
-    EXPECT_EQ(job.outcome.fault, ChangeFault::Refused);
-    EXPECT_EQ(job.outcome.refusedImage, "1");
-    job = edit({"1"}, {{DCM_StudyInstanceUID, QStringLiteral("9")}});
-    job.studyUID = "9";
-    job.oldStudyUID = "1";
-    ASSERT_TRUE(TagFile::previewQA(job, message)) << message.toStdString();
-    EXPECT_EQ(job.outcome.moved, 1);
-    EXPECT_EQ(presenceOf(TagFile::cacheFilePathForStudy("9")), FilePresence::Absent);
-}
 
 TEST_F(TagFileQA, AnEditIsToldInTheAuditLogAndChangesNothingElse)
 {

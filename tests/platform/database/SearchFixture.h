@@ -39,12 +39,6 @@ inline SearchTerm like(SearchColumn column, const char* name)
     return {column, {}, patternsOf(QString::fromUtf8(name)).patterns, {}, {}, {}, {}};
 }
 
-inline SearchTerm between(SearchColumn column, const char* from, const char* to, const char* fromTime = "",
-                          const char* toTime = "")
-{
-    return {column, {}, {}, from, to, fromTime, toTime};
-}
-
 /// Studies as builds leave them, and what is found of them.
 class SearchTest : public DatabaseTest
 {

@@ -55,23 +55,6 @@ TEST_P(StudyChangesTest, GoesPastChangesThatMayNotBeSeen)
     EXPECT_EQ(noted.size(), 0U);
 }
 
-TEST_P(StudyChangesTest, ChangesAreTold)
-{
-    build("1", aStudy("A", "20240101", "P1", {"CT"}));
-    build("2", aStudy("A", "20240101", "P2", {"CT"}));
-    finish("1", aStudy("B", "20240101", "P1", {"CT"}), "e");
-    finish("1", aStudy("B", "20240101", "P1", {"CT"}), "e");  // the same bytes once more
-    finish("1", aStudy("B", "20240101", "P1", {"CT", "MR"}), "f");
-    finish("1", aStudy("B", "20240101", "P1", {"MR"}), "g");
-    ASSERT_TRUE(catalogue().removeStudy("2").good());
-    std::unique_ptr<StudyClaim> claim;
-    ASSERT_TRUE(catalogue().claim("2", 0, claim).good());
-    ASSERT_EQ(claim->finishRemoved().text().toStdString(), "");
-    EXPECT_EQ(changes(), "1A1 2A2 3C1 4A1 5D1 6D2 ");
-    EXPECT_EQ(changes(4), "5D1 6D2 ");
-    EXPECT_EQ(find({}), "1");
-}
-
 /// Whatever isolation a server is set up for.
 TEST_P(StudyChangesTest, WhoFollowsTheChangesMissesNone)
 {

@@ -9,33 +9,6 @@ using StudySearchTest = SearchTest;
 
 INSTANTIATE_TEST_SUITE_P(Engines, StudySearchTest, kBothEngines, engineName);
 
-TEST_P(StudySearchTest, FindsByEachColumn)
-{
-    build("1", aStudy("Müller^Eva", "20240101", "P1", {"CT", "SR"}));
-    build("2", aStudy("Miller^Adam=山田^太郎", "20240301", "P2", {"MR"}));
-    build("3", aStudy("", "", "", {"CT"}));
-    EXPECT_EQ(find({}), "2 1 3");  // what has no date is there, too
-    EXPECT_EQ(find({like(SearchColumn::PatientName, "*uller*")}), "1");
-    EXPECT_EQ(find({like(SearchColumn::PatientName, "*LER*")}), "2 1");
-    EXPECT_EQ(find({like(SearchColumn::PatientName, "*l*")}), "2 1");
-    EXPECT_EQ(find({like(SearchColumn::PatientName, "*田*")}), "2");
-    EXPECT_EQ(find({like(SearchColumn::PatientName, "^adam")}), "2");
-    EXPECT_EQ(find({like(SearchColumn::PatientID, "p*")}), "2 1");
-    EXPECT_EQ(find({oneOf(SearchColumn::PatientID, {"P1"})}), "1");
-    EXPECT_EQ(find({oneOf(SearchColumn::PatientID, {"p1"})}), "");
-    EXPECT_EQ(find({oneOf(SearchColumn::ModalitiesInStudy, {"CT"})}), "1 3");
-    EXPECT_EQ(find({oneOf(SearchColumn::ModalitiesInStudy, {"MR", "SR"})}), "2 1");
-    EXPECT_EQ(
-        find({oneOf(SearchColumn::ModalitiesInStudy, {"CT"}), between(SearchColumn::StudyDate, "2024", "")}),
-        "1");
-    EXPECT_EQ(find({between(SearchColumn::StudyDate, "20240101", "20240228")}), "1");
-    EXPECT_EQ(find({between(SearchColumn::StudyDate, "", "20240301")}), "2 1");
-    EXPECT_EQ(find({oneOf(SearchColumn::StudyUID, {"3", "1", "9"})}), "1 3");
-    EXPECT_EQ(find({oneOf(SearchColumn::SeriesUID, {"P1.2"}), oneOf(SearchColumn::Modality, {"SR"})}), "1");
-    EXPECT_EQ(find({oneOf(SearchColumn::SeriesUID, {"P1.2"}), oneOf(SearchColumn::Modality, {"CT"})}), "");
-    EXPECT_EQ(find({oneOf(SearchColumn::SeriesNumber, {"2"})}), "1");
-}
-
 TEST_P(StudySearchTest, NothingInAValueIsPartOfAStatement)
 {
     const char* const kOdd = "'; \\' ? %s :1 $1 \"x\" {}";
@@ -73,16 +46,6 @@ TEST_P(StudySearchTest, TellsHowTheEngineGoesAboutASearch)
     EXPECT_EQ(search().explainStudies(query, plan).text().toStdString(), "");
     EXPECT_TRUE(plan.contains(GetParam() == Engine::Sqlite ? "study_parts" : "study_search"))
         << plan.toStdString();
-}
-
-TEST_P(StudySearchTest, ARangeOfDatesAndTimesIsOneOfMoments)
-{
-    build("1", aStudy("A", "20240101", "P1", {"CT"}));
-    const auto from = [&](const char* time) {
-        return find({between(SearchColumn::StudyDate, "20240101", "20240102", time, "090000.000000")});
-    };
-    EXPECT_EQ(from("093000.000000"), "1");
-    EXPECT_EQ(from("100001.000000"), "");
 }
 
 TEST_P(StudySearchTest, FindsNothingBeyondItsLimits)

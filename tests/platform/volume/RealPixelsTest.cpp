@@ -1,6 +1,6 @@
 #include "Pixels.h"
 #include "platform/volume/FragmentReader.h"
-#include "support/RealFiles.h"
+#include "support/RealImage.h"
 
 #include <dcmtk/dcmdata/dcpixseq.h>
 #include <dcmtk/dcmdata/dcpxitem.h>
@@ -29,15 +29,7 @@ QString inTransferSyntaxes(const char* name)
     return realFilesFolder() + QLatin1String("/transfer-syntaxes/") + QLatin1String(name);
 }
 
-class RealPixels : public testing::Test
-{
-protected:
-    void SetUp() override
-    {
-        if (realFilesFolder().isEmpty())
-            GTEST_SKIP() << "KDD_TEST_DATA names no folder of real files";
-    }
-};
+using RealPixels = RealImages;
 
 /// The same image in several transfer syntaxes without loss, and a frame of it.
 const std::tuple<int, std::vector<const char*>> kTwins[] = {

@@ -1,7 +1,5 @@
 #include "server/change/ChangedArchive.h"
 
-#include <QDirIterator>
-
 #include <gmock/gmock.h>
 #include <kddlib/Catalogue.h>
 
@@ -109,15 +107,7 @@ TEST_F(ChangeTest, PreviewTellsWhatIsThenDoneAndDoesNothing)
 {
     start();
     storeStudy();
-    const auto files = [this] {
-        QStringList names;
-        QDirIterator each(mStore.folder(), {QStringLiteral("*.tc*")}, QDir::Files,
-                          QDirIterator::Subdirectories);
-        while (each.hasNext())
-            names << each.next();
-        names.sort();
-        return names;
-    };
+    const auto files = [this] { return filesBelow(mStore.folder(), {QStringLiteral("*.tc*")}); };
     for (const char* job : kJobs) {
         const Reply shown = get("/studies/1.2/metadata");
         const std::string fed = feed("1.2");

@@ -10,9 +10,7 @@
 #include "support/TemporaryStore.h"
 
 #include <QDir>
-#include <QDirIterator>
 #include <QUrl>
-#include <QXmlStreamReader>
 
 #include <fcntl.h>
 #include <gmock/gmock.h>
@@ -101,14 +99,7 @@ protected:
         return QByteArray::fromStdString(out.str() + "]");
     }
 
-    QStringList keptFiles() const
-    {
-        QStringList files;
-        QDirIterator all(mStore.filePath("answers"), QDir::Files, QDirIterator::Subdirectories);
-        while (all.hasNext())
-            files.append(all.next());
-        return files;
-    }
+    QStringList keptFiles() const { return filesBelow(mStore.filePath("answers")); }
 
     TemporaryStore mStore;
     Setting mPatience{"KDD_READ_PATIENCE", "0"};
@@ -162,11 +153,6 @@ TEST_F(MetadataTest, IsGivenInTheFormThatIsAskedFor)
     const QByteArray boundary = "--" + type.mid(type.indexOf("boundary=") + 9);
     EXPECT_EQ(xml.body.count(boundary + "\r\nContent-Type: application/dicom+xml\r\n\r\n<?xml"), 2);
     EXPECT_TRUE(xml.body.endsWith("\r\n" + boundary + "--\r\n"));
-    const int begin = xml.body.indexOf("<?xml");
-    QXmlStreamReader reader(xml.body.mid(begin, xml.body.indexOf("\r\n--", begin) - begin));
-    while (!reader.atEnd())
-        reader.readNext();
-    EXPECT_FALSE(reader.hasError()) << qPrintable(reader.errorString());
 }
 
 TEST_F(MetadataTest, HoldsOnlyTheFieldsThatAreNamed)

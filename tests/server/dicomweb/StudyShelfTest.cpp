@@ -5,7 +5,6 @@
 #include "support/LogCapture.h"
 #include "support/Setting.h"
 #include "support/TemporaryStore.h"
-#include "support/Threads.h"
 
 #include <QFile>
 
@@ -185,25 +184,6 @@ TEST_F(StudyShelfTest, ReadsAgainOnlyWhatChangedOrHadToGo)
     EXPECT_EQ(reads([&] { EXPECT_EQ(found(shelf) + found(shelf), "NewNew"); }), 1);
     EXPECT_EQ(reads([&] { found(mShelf), found(mShelf); }), 2) << "too young to be believed";
     LogFile::setLevel(LogFile::Level::Information);
-}
-
-TEST_F(StudyShelfTest, NeverGoesBackWhileItIsWritten)
-{
-    mPatience.set("60000");
-    write("100");
-    std::atomic<bool> isDone = false;
-    onThreads(4, [&](int thread) {
-        for (int i = 101; thread == 0 && i < 160; ++i)
-            write(QByteArray::number(i).constData());
-        if (thread == 0)
-            isDone = true;
-        for (int last = 100; !isDone;) {
-            const int now = found(mShelf).toInt();
-            EXPECT_GE(now, last);
-            last = now;
-        }
-    });
-    EXPECT_EQ(found(mShelf), "159");
 }
 
 }  // namespace

@@ -15,9 +15,7 @@ protected:
     /// Whether there is a file that is not whole.
     bool isReceiving() const
     {
-        return QDirIterator(mStore.filePath("objects/.incoming"), {QStringLiteral("1")}, QDir::Files,
-                            QDirIterator::Subdirectories)
-            .hasNext();
+        return !filesBelow(mStore.filePath("objects/.incoming"), {QStringLiteral("1")}).isEmpty();
     }
 
     /// What is left of the only file behind its meta information.

@@ -12,8 +12,6 @@ namespace Kdd
 namespace
 {
 
-constexpr int kPatience = 60;  // [s]
-
 template <typename Number>
 QByteArray big(Number number)
 {
@@ -41,33 +39,15 @@ QByteArray command(const QByteArray& elements)
     return QByteArray(4, 0) + little<quint32>(4) + little(static_cast<quint32>(elements.size())) + elements;
 }
 
-int newSocket()
-{
-    return ::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
-}
-
-sockaddr_in portOfThisMachine(quint16 port)
-{
-    sockaddr_in at = {};
-    at.sin_family = AF_INET;
-    at.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-    at.sin_port = htons(port);
-    return at;
-}
-
-bool connects(int socket, quint16 port)
-{
-    const sockaddr_in there = portOfThisMachine(port);
-    return ::connect(socket, reinterpret_cast<const sockaddr*>(&there), sizeof there) == 0;
-}
-
 }  // namespace
 
 quint16 freePort()
 {
-    sockaddr_in at = portOfThisMachine(0);
+    sockaddr_in at = {};
     socklen_t size = sizeof at;
-    const int socket = newSocket();
+    at.sin_family = AF_INET;
+    at.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    const int socket = ::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
     EXPECT_EQ(::bind(socket, reinterpret_cast<sockaddr*>(&at), size), 0);
     EXPECT_EQ(::getsockname(socket, reinterpret_cast<sockaddr*>(&at), &size), 0);
     ::close(socket);
@@ -76,10 +56,7 @@ quint16 freePort()
 
 bool isListening(quint16 port)
 {
-    const int socket = newSocket();
-    const bool isThere = connects(socket, port);
-    ::close(socket);
-    return isThere;
+    return Client(':' + QByteArray::number(port)).isConnected();
 }
 
 QByteArray datasetOf(const QByteArray& file)
@@ -88,20 +65,6 @@ QByteArray datasetOf(const QByteArray& file)
     return file.size() < kToLength + 4
                ? QByteArray()
                : file.mid(kToLength + 4 + qFromLittleEndian<qint32>(file.constData() + kToLength));
-}
-
-RawCaller::RawCaller(const QByteArray& address)
-    : mSocket(newSocket())
-{
-    const timeval time = {kPatience, 0};
-    ::setsockopt(mSocket, SOL_SOCKET, SO_RCVTIMEO, &time, sizeof time);
-    // One that fails is seen by what does not come.
-    connects(mSocket, address.mid(address.lastIndexOf(':') + 1).toUShort());
-}
-
-RawCaller::~RawCaller()
-{
-    ::close(mSocket);
 }
 
 QByteArray RawCaller::pdu(char kind, const QByteArray& body)
@@ -155,33 +118,15 @@ QByteArray RawCaller::actionCommand()
                    number(0x0800, 0) + text(0x1001, "1.2.840.10008.1.20.1.1") + number(0x1008, 1));
 }
 
-void RawCaller::send(const QByteArray& bytes) const
+QByteArray RawCaller::receive()
 {
-    for (int sent = 0; sent < bytes.size();) {
-        const ssize_t count =
-            ::send(mSocket, bytes.constData() + sent, static_cast<size_t>(bytes.size() - sent), MSG_NOSIGNAL);
-        if (count <= 0)
-            return;  // the other side has gone, which is seen by what comes
-        sent += static_cast<int>(count);
-    }
-}
-
-QByteArray RawCaller::receive() const
-{
-    QByteArray bytes;
-    int wanted = 6;
-    while (bytes.size() < wanted) {
-        char block[4096];
-        const auto most = qMin<size_t>(sizeof block, static_cast<size_t>(wanted - bytes.size()));
-        const ssize_t count = ::recv(mSocket, block, most, 0);
-        EXPECT_FALSE(count < 0 && errno == EAGAIN) << "nothing comes";
-        if (count <= 0)
-            return {};
-        bytes.append(block, static_cast<int>(count));
-        if (bytes.size() == 6)
-            wanted += static_cast<int>(qFromBigEndian<quint32>(bytes.constData() + 2));
-    }
-    return bytes;
+    constexpr int kHead = 6;
+    const QByteArray head = mConnection.take(kHead);
+    if (head.size() < kHead)
+        return {};
+    const auto length = qFromBigEndian<quint32>(head.constData() + 2);
+    const QByteArray body = mConnection.take(length);
+    return body.size() == static_cast<int>(length) ? head + body : QByteArray();
 }
 
 QByteArray RawCaller::associate(const QVector<Offer>& offers, const QByteArray& called,
@@ -215,14 +160,14 @@ int RawCaller::store(const QByteArray& sopClass, const QByteArray& instance, con
     return status();
 }
 
-int RawCaller::status() const
+int RawCaller::status()
 {
     const QByteArray answer = receive();
     const int at = answer.indexOf(QByteArray("\0\0\0\x09\x02\0\0\0", 8));
     return at < 0 ? -1 : qFromLittleEndian<quint16>(answer.constData() + at + 8);
 }
 
-void RawCaller::release() const
+void RawCaller::release()
 {
     send(pdu(5, QByteArray(4, 0)));
     EXPECT_EQ(receive().left(1), QByteArray(1, 6));

@@ -1,7 +1,6 @@
 #pragma once
 
-#include <QByteArray>
-#include <QVector>
+#include "server/http/Client.h"
 
 namespace Kdd
 {
@@ -25,7 +24,10 @@ public:
         QVector<QByteArray> transferSyntaxes;
     };
 
-    explicit RawCaller(const QByteArray& address);
+    explicit RawCaller(const QByteArray& address)
+        : mConnection(address)
+    {
+    }
 
     /// Whose association is asked for at once.
     RawCaller(const QByteArray& address, const QVector<Offer>& offers, const QByteArray& calling = "TEST")
@@ -33,9 +35,6 @@ public:
     {
         associate(offers, "KDD", calling);
     }
-    ~RawCaller();
-    RawCaller(const RawCaller&) = delete;
-    RawCaller& operator=(const RawCaller&) = delete;
 
     static QByteArray pdu(char kind, const QByteArray& body);
 
@@ -54,10 +53,10 @@ public:
     /// Asks for storage commitment.
     static QByteArray actionCommand();
 
-    void send(const QByteArray& bytes) const;
+    void send(const QByteArray& bytes) const { mConnection.send(bytes); }
 
     /// The next PDU with its head; empty when the connection has ended.
-    QByteArray receive() const;
+    QByteArray receive();
 
     /// The answer to a request.
     QByteArray associate(const QVector<Offer>& offers, const QByteArray& called = "KDD",
@@ -71,12 +70,12 @@ public:
               char context = 1, int piece = 10000);
 
     /// The status of the next answer; -1 when the connection ended.
-    int status() const;
+    int status();
 
-    void release() const;
+    void release();
 
 private:
-    int mSocket;
+    Client mConnection;
     QByteArray mAnswer;
 };
 

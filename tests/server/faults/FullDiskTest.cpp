@@ -1,8 +1,6 @@
 #include "server/dimse/RawCaller.h"
 #include "server/faults/Served.h"
 
-#include <QDirIterator>
-
 #include <dcmtk/dcmdata/dcuid.h>
 #include <sys/statvfs.h>
 
@@ -85,27 +83,18 @@ protected:
     int found() const { return jsonAt(get("studies/1.2/instances").body).toArray().size(); }
 
     const Setting mWatermark{"KDD_FREE_SPACE", "0"};
-
-    int filesBelow(const char* folder) const
-    {
-        int count = 0;
-        QDirIterator files(onDisk(folder), QDir::Files | QDir::Hidden, QDirIterator::Subdirectories);
-        for (; files.hasNext(); files.next())
-            ++count;
-        return count;
-    }
 };
 
 TEST_F(FullDisk, RefusesAnObjectForWhichThereIsNoRoomAndGoesOnWhenThereIs)
 {
     const QByteArray large = fileOf("1.2.3.1", 500000);
     EXPECT_EQ(stow(fileOf("1.2.3.2", 4)), 200);
-    const int before = filesBelow("objects");
+    const QStringList before = filesBelow(onDisk("objects"));
     fill(400000);
     for (int i = 0; i < 3; ++i) {
         EXPECT_EQ(stow(large), 503);
         EXPECT_EQ(associate("1.2.3.1", large), 0xA700);
-        EXPECT_EQ(filesBelow("objects"), before) << "nothing of it is left";
+        EXPECT_EQ(filesBelow(onDisk("objects")), before) << "nothing of it is left";
     }
     EXPECT_EQ(found(), 1);
     giveRoom();

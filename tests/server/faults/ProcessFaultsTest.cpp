@@ -1,7 +1,6 @@
 #include "server/faults/Served.h"
 
 #include <QCryptographicHash>
-#include <QDirIterator>
 
 #include <sys/resource.h>
 #include <unistd.h>
@@ -36,14 +35,7 @@ protected:
         ASSERT_EQ(addImages().exitCode, 0);
     }
 
-    QStringList keptAnswers() const
-    {
-        QStringList names;
-        QDirIterator files(path("store/meta/answers"), QDir::Files, QDirIterator::Subdirectories);
-        while (files.hasNext())
-            names.append(files.next());
-        return names;
-    }
+    QStringList keptAnswers() const { return filesBelow(path("store/meta/answers")); }
 
     /// A client that has the head of a large answer and no more.
     std::unique_ptr<Client> startedClient(Reply& head) const

@@ -45,6 +45,7 @@ protected:
             return -1;
         signal(number);
         EXPECT_TRUE(mServer->waitForFinished(kTimeout));
+        EXPECT_FALSE(fileContent(path("log")).contains("runtime error"));
         return mServer->exitStatus() == QProcess::NormalExit ? mServer->exitCode() : -1;
     }
 

@@ -54,16 +54,6 @@ TEST(AcceptHeader, TellsTheTransferSyntaxBestFirst)
     EXPECT_EQ(accept.ranges()[1].quality, 300);
 }
 
-TEST(AcceptHeader, IsOverruledByTheParameter)
-{
-    const auto chosen = [](const char* target, const Headers& headers) {
-        return AcceptHeader::of(requestFor(target, headers)).choose(kOffers);
-    };
-    EXPECT_EQ(chosen("", {}), 0);
-    EXPECT_EQ(chosen("", {{"accept", "text/html"}}), -1);
-    EXPECT_EQ(chosen("?accept=image/jpeg", {{"accept", "text/html"}}), 3);
-}
-
 TEST(AcceptHeader, KnowsContentCodings)
 {
     const std::tuple<const char*, bool> cases[] = {

@@ -3,6 +3,7 @@
 #include <QProcess>
 
 #include <arpa/inet.h>
+#include <gtest/gtest.h>
 #include <sys/socket.h>
 #include <unistd.h>
 
@@ -94,6 +95,7 @@ bool Client::receiveMore()
     char part[65536];
     const auto count = mTls != nullptr ? SSL_read(mTls.get(), part, sizeof part)
                                        : static_cast<int>(::recv(mSocket, part, sizeof part, 0));
+    EXPECT_FALSE(mTls == nullptr && count < 0 && errno == EAGAIN) << "nothing comes";
     if (count > 0)
         mUnread.append(part, count);
     return count > 0;

@@ -80,6 +80,9 @@ public:
     /// Ends the connection without a word, what was received and not read included.
     void reset();
 
+    /// The next so many bytes; fewer when the connection ends before.
+    QByteArray take(qint64 size);
+
     /// Everything up to the end of the connection.
     QByteArray rest();
 
@@ -87,7 +90,6 @@ private:
     void agree();
     bool receiveMore();
     bool receiveUntil(const QByteArray& end);
-    QByteArray take(qint64 size);
     void receiveChunks(Reply& reply);
 
     int mSocket;

@@ -154,36 +154,4 @@ TEST_F(RetrieveTest, GivesValuesThatWereLeftOutAndRangesOfThem)
                     "Content-Location: series/1.2.3/instances/1.2.3.1/bulkdata/0040A730/1/0040A160"));
 }
 
-TEST_F(RetrieveTest, GivesRealFramesAndObjects)
-{
-    if (realFilesFolder().isEmpty())
-        GTEST_SKIP() << "KDD_TEST_DATA is not set";
-    int given = 0;
-    for (const QString& file : realFiles("transfer-syntaxes") + realFiles("multiframe")) {
-        DcmFileFormat dicom;
-        OFString study;
-        OFString series;
-        OFString sop;
-        if (readDicomFile(file.toLocal8Bit().constData(), dicom).bad() ||
-            dicom.getDataset()->findAndGetOFString(DCM_StudyInstanceUID, study).bad() ||
-            dicom.getDataset()->findAndGetOFString(DCM_SeriesInstanceUID, series).bad() ||
-            dicom.getDataset()->findAndGetOFString(DCM_SOPInstanceUID, sop).bad() || study.empty() ||
-            !isUID(QByteArray::fromStdString(series)) || sop.find('.') == OFString_npos)
-            continue;  // without point it is the first byte of one whose VR is unknown
-        add(file);
-        const QByteArray path =
-            QByteArray::fromStdString("studies/" + study + "/series/" + series + "/instances/" + sop);
-        const bool hasPixels = dicom.getDataset()->tagExists(DCM_PixelData) ||
-                               dicom.getDataset()->tagExists(DCM_FloatPixelData) ||
-                               dicom.getDataset()->tagExists(DCM_DoubleFloatPixelData);
-        EXPECT_EQ(get(path + "/frames/1").status, hasPixels ? 200 : 404) << qPrintable(file);
-        Http::Response instance = get(path, kStored);
-        EXPECT_EQ(instance.status, 200) << qPrintable(file);
-        EXPECT_EQ(nameIn(bodyOf(instance), DCM_SOPInstanceUID), QByteArray::fromStdString(sop))
-            << qPrintable(file);
-        ++given;
-    }
-    EXPECT_GT(given, 50);
-}
-
 }  // namespace

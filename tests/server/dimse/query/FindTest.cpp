@@ -2,11 +2,8 @@
 #include "server/dicomweb/search/AnswerObject.h"
 #include "server/dimse/QueryAnswer.h"
 #include "server/dimse/QueryIdentifier.h"
-#include "support/RealFiles.h"
 
 #include <gmock/gmock.h>
-
-#include <random>
 
 using namespace Kdd;
 using testing::HasSubstr;
@@ -252,78 +249,6 @@ TEST_P(FindTest, EndsWhenItIsCancelled)
     EXPECT_THAT(find(onLevel("IMAGE", "StudyInstanceUID=7|SOPInstanceUID"), "-S --cancel 1"),
                 HasSubstr("Cancel: MatchingTerminatedDueToCancelRequest"));
     EXPECT_LT(answers().size(), 300U);
-}
-
-using FindOracle = FindTest;
-
-INSTANTIATE_TEST_SUITE_P(Engines, FindOracle, kBothEngines, engineName);
-
-const std::tuple<const char*, QByteArray, const char*, DcmTagKey> kSearched[] = {
-    {"STUDY", "studies", "0020000D", DCM_StudyInstanceUID},
-    {"SERIES", "series", "0020000E", DCM_SeriesInstanceUID},
-    {"IMAGE", "instances", "00080018", DCM_SOPInstanceUID}};
-
-const std::pair<const char*, QByteArray> kAttributes[] = {{"00100010", "PatientName"},
-                                                          {"00100020", "PatientID"},
-                                                          {"00080050", "AccessionNumber"},
-                                                          {"00081030", "StudyDescription"},
-                                                          {"00200010", "StudyID"}};
-
-/// What is asked for of a value, in words that mean the same to both.
-QString question(const QString& value, std::mt19937& random)
-{
-    const int cut = 1 + static_cast<int>(random() % static_cast<unsigned>(value.size()));
-    switch (random() % 3) {
-    case 0:
-        return value;
-    case 1:
-        return value.left(cut) + QLatin1Char('*');
-    default:
-        return QLatin1Char('*') + value.mid(value.size() - cut);
-    }
-}
-
-TEST_P(FindOracle, AgreesWithSearchesOverHttp)
-{
-    if (realFilesFolder().isEmpty())
-        GTEST_SKIP() << "KDD_TEST_DATA is not set";
-    for (const char* folder : {"charsets", "modalities", "series/geometry"}) {
-        for (const QString& file : realFiles(folder))
-            QFile::copy(file, path("images") + QLatin1Char('/') +
-                                  QFileInfo(file).path().section(QLatin1Char('/'), -1) + QLatin1Char('_') +
-                                  QFileInfo(file).fileName());
-    }
-    // Some of the files are none that are taken.
-    ASSERT_EQ(runTool(path("store"), address(), words("add " + path("images").toUtf8())), 1);
-    start();
-    std::mt19937 random(7);
-    int found = 0;
-    for (int i = 0; i < 60; ++i) {
-        const auto& [level, resource, uid, shown] = kSearched[random() % 3];
-        const auto& [tag, name] = kAttributes[random() % 5];
-        const QJsonArray all = list("studies?limit=1000&includefield=StudyDescription");
-        const QString value =
-            textOf(all[static_cast<int>(random() % static_cast<unsigned>(all.size()))], tag);
-        const QString asked = value.isEmpty() ? value : question(value, random);
-        // Findscu takes some letters for its own, and a list is none over HTTP.
-        if (asked.isEmpty() || asked.contains(QRegExp(QStringLiteral("[\\\\\"=,|]"))) ||
-            asked.trimmed() != asked)
-            continue;
-        const QByteArray target =
-            resource + "?limit=10000&" + name + '=' + asked.toUtf8().toPercentEncoding();
-        QStringList expected;
-        for (const QJsonValue& each : list(target))
-            expected << textOf(each, uid);
-        expected.sort();
-        const std::string said =
-            find(onLevel(level, name + '=' + asked.toUtf8() +
-                                    "|SpecificCharacterSet=ISO_IR 192|StudyInstanceUID|SeriesInstanceUID|"
-                                    "SOPInstanceUID"));
-        EXPECT_EQ(answered(shown), expected.join(QLatin1Char(' ')).toStdString())
-            << target.toStdString() << said;
-        found += expected.size();
-    }
-    EXPECT_GT(found, 50);
 }
 
 }  // namespace
