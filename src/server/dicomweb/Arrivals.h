@@ -32,6 +32,9 @@ public:
     /// Brings in what this server has taken: of the study, or of all studies when that is empty.
     virtual void bringInOwn(const QByteArray& studyUID) = 0;
 
+    /// Whether an image is registered and to be shown in the study; not where nobody can tell.
+    virtual bool isRegistered(const QByteArray& studyUID, const QByteArray& sopInstanceUID) = 0;
+
     /// Takes over a study whose tag file does not show yet what the database was told: from now on it counts among what this
     /// server has taken.
     virtual void takeOver(const QByteArray& studyUID) = 0;

@@ -104,8 +104,9 @@ struct StudyShelf::Private
     void forget(const QByteArray& uid);
     void trim();
 
-    bool isCurrent(Entry& entry, const QByteArray& path, Clock::time_point asked, bool needsTree);
-    void read(Entry& entry, const QByteArray& uid, const QString& path);
+    bool isCurrent(const Entry& entry, const QByteArray& path, Clock::time_point asked) const;
+    void read(Entry& entry, const QByteArray& uid, const QString& path,
+              std::shared_ptr<const ServedStudy>& study);
     Presence absence(const QByteArray& uid, const QByteArray& path) const;
     Presence look(const QByteArray& uid, bool needsTree, QByteArray& version,
                   std::shared_ptr<const ServedStudy>& study);
@@ -191,11 +192,8 @@ void StudyShelf::Private::trim()
 }
 
 /// Whether what the entry knows is what the file says now, or said after it was asked for.
-bool StudyShelf::Private::isCurrent(Entry& entry, const QByteArray& path, Clock::time_point asked,
-                                    bool needsTree)
+bool StudyShelf::Private::isCurrent(const Entry& entry, const QByteArray& path, Clock::time_point asked) const
 {
-    if (entry.presence == Presence::Found && needsTree && studyOf(entry) == nullptr)
-        return false;
     // Others began to read after this one asked: whatever was written before that they have seen.
     if (entry.readSince > asked)
         return true;
@@ -203,7 +201,9 @@ bool StudyShelf::Private::isCurrent(Entry& entry, const QByteArray& path, Clock:
     return entry.state.age > settledAge && entry.state.equals(stateOf(path)) && !hasJournal(path);
 }
 
-void StudyShelf::Private::read(Entry& entry, const QByteArray& uid, const QString& path)
+/// `study` is what the entry holds, and afterwards what was read.
+void StudyShelf::Private::read(Entry& entry, const QByteArray& uid, const QString& path,
+                               std::shared_ptr<const ServedStudy>& study)
 {
     const QByteArray name = pathBytes(path);
     entry.readSince = Clock::now();
@@ -227,11 +227,12 @@ void StudyShelf::Private::read(Entry& entry, const QByteArray& uid, const QStrin
         entry.state = before.equals(stateOf(name)) ? before : FileState();
         entry.presence = Presence::Found;
         // The tree that is there is as good, and others may hold it.
-        if (version == entry.version && studyOf(entry) != nullptr)
+        if (version == entry.version && study != nullptr)
             return;
         entry.version = version;
         const qint64 weight = file->statistics().uncompressedSize;
-        put(entry, std::make_shared<const ServedStudy>(std::move(file), version), weight);
+        study = std::make_shared<const ServedStudy>(std::move(file), version);
+        put(entry, study, weight);
         return;
     } else if (stateOf(name).isAbsent()) {
         entry.presence = absence(uid, name);
@@ -266,14 +267,18 @@ Presence StudyShelf::Private::look(const QByteArray& uid, bool needsTree, QByteA
     Presence presence = Presence::Absent;
     {
         const std::lock_guard<std::mutex> lock(entry->reading);
-        const bool isReady = isCurrent(*entry, pathBytes(path), asked, needsTree);
+        // Held from here on: the entry may lose it at any time, when others need room.
+        study = studyOf(*entry);
+        const bool isUsable = entry->presence != Presence::Found || !needsTree || study != nullptr;
+        const bool isReady = isUsable && isCurrent(*entry, pathBytes(path), asked);
         if (!isReady)
-            read(*entry, uid, path);
+            read(*entry, uid, path, study);
         presence = entry->presence;
         if (presence == Presence::Found) {
             ++(isReady ? count.hits : count.misses);
             version = entry->version;
-            study = studyOf(*entry);
+        } else {
+            study.reset();
         }
     }
     if (presence == Presence::Absent || presence == Presence::Unbuilt || presence == Presence::Missing)

@@ -5,6 +5,7 @@
 #include "support/LogCapture.h"
 #include "support/Setting.h"
 #include "support/TemporaryStore.h"
+#include "support/Threads.h"
 
 #include <QFile>
 
@@ -160,6 +161,17 @@ TEST_F(StudyShelfTest, SeesAJournalBesideAFileThatDidNotChange)
     EXPECT_EQ(found(shelf), "Old");
     promise();
     EXPECT_EQ(found(shelf), "New");
+}
+
+TEST_F(StudyShelfTest, GivesWhatItFindsThoughOthersNeedItsRoom)
+{
+    write("One");
+    write("Other", "1.3");
+    StudyShelf shelf(1, kAtOnce);
+    onThreads(4, [&](int thread) {
+        for (int i = 0; i < 2000; ++i)
+            EXPECT_EQ(found(shelf, thread % 2 == 0 ? kStudy : "1.3"), thread % 2 == 0 ? "One" : "Other");
+    });
 }
 
 TEST_F(StudyShelfTest, ReadsAgainOnlyWhatChangedOrHadToGo)

@@ -125,7 +125,15 @@ TEST_F(StoreTest, TellsNothingIncompleteOfAStudyThatAnotherOneWorksOn)
     EXPECT_EQ(held.status, 503);
     EXPECT_EQ(held.header("Retry-After"), "1");
     EXPECT_EQ(get("/studies?StudyInstanceUID=1.2").status, 200) << "it is known";
+    // Nor when it is tried, and in vain.
+    const QString object = mStore.filePath("objects/1.2/1.2.3/1.2.3.2.dcm");
+    ASSERT_TRUE(QFile::rename(object, mStore.filePath("away")));
+    start();
     claim.reset();
+    EXPECT_EQ(get("/studies/1.2/instances?SOPInstanceUID=1.2.3.2").status, 503);
+    EXPECT_EQ(get("/studies/1.2/instances?SOPInstanceUID=1.2.3.9").body, "[]");
+    EXPECT_EQ(get("/studies/1.2/instances?SOPInstanceUID=1.2.3.1&Modality=SR").body, "[]");
+    ASSERT_TRUE(QFile::rename(mStore.filePath("away"), object));
     EXPECT_EQ(instances("1.2"), 2);
 }
 

@@ -6,6 +6,12 @@
 #include "server/http/Compression.h"
 #include "server/http/MultipartWriter.h"
 
+#include <dcmtk/dcmdata/dcdeftag.h>
+#include <kddlib/LogFile.h>
+#include <kddlib/TagFile.h>
+
+#include <algorithm>
+
 namespace Kdd::DicomWeb
 {
 namespace
@@ -50,6 +56,25 @@ Http::Response studyIsWritten()
     Http::Response response = Http::failure(503, QStringLiteral("A study is being written; ask again"));
     response.addHeader("Retry-After", "1");
     return response;
+}
+
+/// Of images of a study that are asked for by their UIDs: whether one is registered and its tag file does not show it.
+bool lacksRegistered(const SearchRequest& search, StudyShelf& shelf)
+{
+    const auto named =
+        std::find_if(search.conditions.begin(), search.conditions.end(), [](const SearchCondition& each) {
+            return !each.isInItems() && each.key() == DCM_SOPInstanceUID;
+        });
+    if (named == search.conditions.end() || search.study.isEmpty() || shelf.arrivals() == nullptr)
+        return false;
+    std::shared_ptr<const ServedStudy> study;
+    shelf.find(search.study, study);
+    return std::any_of(named->list.begin(), named->list.end(), [&](const QString& value) {
+        const QByteArray uid = value.trimmed().toUtf8();
+        const auto isShown = [&](const TagFile& file) { return file.findImage(uid) != nullptr; };
+        return (study == nullptr || !study->look(isShown)) &&
+               shelf.arrivals()->isRegistered(search.study, uid);
+    });
 }
 
 }  // namespace
@@ -100,6 +125,12 @@ Http::Response SearchResource::answer(const Http::Request& request, const Resour
         }
         if (run.unread() > 0 && !search.study.isEmpty()) {
             response = Http::failure(500, QStringLiteral("The study's tag file is missing or damaged"));
+            return done;
+        }
+        // Whatever the reason is, that it is not there would be wrong.
+        if (isBelowStudies && answers.count() == 0 && lacksRegistered(search, mShelf)) {
+            LogFile::warnf("Study %s does not show an image that is registered", search.study.constData());
+            response = studyIsWritten();
             return done;
         }
         std::shared_ptr<const ServedStudy> study;

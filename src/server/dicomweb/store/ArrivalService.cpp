@@ -3,6 +3,8 @@
 #include <kddlib/ExResource.h>
 #include <kddlib/LogFile.h>
 
+#include <algorithm>
+
 namespace Kdd::DicomWeb
 {
 namespace
@@ -122,7 +124,18 @@ Arrived ArrivalService::bringIn(const QByteArray& studyUID)
     });
     if (done.good())
         return Arrived::Brought;
+    LogFile::warnf("Study %s is not complete yet: %s", studyUID.constData(), qUtf8Printable(done.text()));
     return attempt.reachedFiles ? Arrived::Stuck : Arrived::Held;
+}
+
+bool ArrivalService::isRegistered(const QByteArray& studyUID, const QByteArray& sopInstanceUID)
+{
+    QVector<Kxg::KeptFile> files;
+    const Result asked = mDatabase.ask(
+        [&](Kxg::Catalogue& catalogue) { return catalogue.imageFiles(studyUID, sopInstanceUID, files); });
+    return asked.good() && std::any_of(files.cbegin(), files.cend(), [&](const Kxg::KeptFile& file) {
+               return file.isShown && file.shownStudyUID == studyUID && file.shownImage == sopInstanceUID;
+           });
 }
 
 void ArrivalService::bringInOwn(const QByteArray& studyUID)

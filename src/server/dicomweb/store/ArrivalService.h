@@ -34,6 +34,7 @@ public:
     const ThreadCatalogue& database() const { return mDatabase; }
 
     Arrived bringIn(const QByteArray& studyUID) override;
+    bool isRegistered(const QByteArray& studyUID, const QByteArray& sopInstanceUID) override;
     void takeOver(const QByteArray& studyUID) override { mStudies.addWaiting(studyUID); }
     void bringInOwn(const QByteArray& studyUID) override;
 
